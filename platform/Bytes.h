@@ -1,0 +1,47 @@
+#pragma once
+
+#include <cstddef>
+#include <memory>
+#include <string>
+#include <string_view>
+
+namespace platform {
+
+/// A run of bytes that nobody changes any more: a response body, a mapped file, an upload.
+///
+/// Copies share the bytes and their owner (a string, a mapping, a slice of a larger run); the last copy
+/// releases them. Immutable, hence any thread.
+class Bytes {
+public:
+    Bytes() = default;
+
+    /// Takes the string's contents over.
+    explicit Bytes(std::string contents)
+    {
+        auto owned = std::make_shared<const std::string>(std::move(contents));
+        _view = *owned;
+        _owner = std::move(owned);
+    }
+
+    /// Bytes at `view`, kept alive by `owner`.
+    Bytes(std::shared_ptr<const void> owner, std::string_view view) : _owner(std::move(owner)), _view(view) {}
+
+    [[nodiscard]] std::string_view view() const { return _view; }
+    [[nodiscard]] const char* data() const { return _view.data(); }
+    [[nodiscard]] std::size_t size() const { return _view.size(); }
+    [[nodiscard]] bool empty() const { return _view.empty(); }
+
+    /// A part of these bytes that shares their owner. `offset` must not lie past the end.
+    [[nodiscard]] Bytes slice(std::size_t offset, std::size_t count = std::string_view::npos) const
+    {
+        return {_owner, _view.substr(offset, count)};
+    }
+
+    friend bool operator==(const Bytes& a, const Bytes& b) { return a._view == b._view; }
+
+private:
+    std::shared_ptr<const void> _owner;
+    std::string_view _view;
+};
+
+} // namespace platform

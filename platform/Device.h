@@ -1,0 +1,68 @@
+#pragma once
+
+#include <array>
+#include <memory>
+#include <string>
+
+#include "platform/Files.h"
+#include "platform/Queue.h"
+
+namespace platform {
+
+class Clock;
+class CounterStore;
+class DeviceProfileSource;
+class LocaleSource;
+class LocationSource;
+class NotificationCenter;
+class ProcessIdentity;
+class Transactions;
+class UrlLoader;
+class UserDefaults;
+namespace ipc {
+class Transport;
+}
+
+/// Tells other processes of the user that something happened, by name: a signal on the session bus.
+class SystemNotifier {
+public:
+    virtual ~SystemNotifier() = default;
+    /// Posts `name` ("com.quorvane.…"); nothing where there is no session bus. Any thread.
+    virtual void post(const std::string& name) = 0;
+};
+
+/// The device that the daemon runs on: what a service needs from outside, by role. Plain references, set once and never
+/// null; whoever makes a Device keeps its parts alive longer than every service. tests/support has one of twins.
+struct Device {
+    Clock& clock;
+    Executor& executor;     ///< worker threads
+    Executor& mainExecutor; ///< the main thread's run loop
+    FileSystem& files;
+    Directories directories;
+    UserDefaults& userDefaults;      ///< the daemon's own suite
+    UserDefaults& lookupDefaults;    ///< the suite shared with lookup clients
+    NotificationCenter& notifications;
+    CounterStore& counters;
+    Transactions& transactions;
+    LocaleSource& locale;
+    LocationSource& location;
+    DeviceProfileSource& profile;
+    ProcessIdentity& processes;
+    SystemNotifier& systemNotifier;
+    UrlLoader& urlLoader;
+    ipc::Transport& ipc;
+
+    [[nodiscard]] std::shared_ptr<Queue> serialQueue(std::string label, Priority priority = Priority::Default) const;
+    [[nodiscard]] std::shared_ptr<Queue> concurrentQueue(std::string label, Priority priority = Priority::Default) const;
+    /// A shared concurrent queue of that priority, for work that guards no state.
+    [[nodiscard]] std::shared_ptr<Queue> globalQueue(Priority priority) const;
+    /// Tasks on the main thread.
+    [[nodiscard]] std::shared_ptr<Queue> mainQueue() const;
+
+    std::array<std::shared_ptr<Queue>, 3> globalQueues{}; ///< by Priority; made by makeQueues
+    std::shared_ptr<Queue> main{};
+    /// Makes the two above; whoever fills in a Device calls it once.
+    void makeQueues();
+};
+
+} // namespace platform

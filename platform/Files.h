@@ -1,0 +1,78 @@
+#pragma once
+
+#include <cstdint>
+#include <filesystem>
+#include <memory>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/Bytes.h"
+#include "platform/Date.h"
+#include "platform/Error.h"
+
+namespace platform {
+
+/// An open file descriptor that closes itself. Movable; the holder may hand it to another thread.
+class FileHandle {
+public:
+    FileHandle() = default;
+    explicit FileHandle(int fd) : _fd(fd) {}
+    FileHandle(FileHandle&& other) noexcept : _fd(other.release()) {}
+    FileHandle& operator=(FileHandle&& other) noexcept;
+    ~FileHandle();
+    [[nodiscard]] int fd() const { return _fd; }
+    [[nodiscard]] explicit operator bool() const { return _fd >= 0; }
+    /// Gives the descriptor up; the caller closes it.
+    int release();
+
+private:
+    int _fd = -1;
+};
+
+struct FileInfo {
+    enum class Kind { File, Directory, Other };
+    Kind kind = Kind::File;
+    std::uint64_t size = 0;
+    Date modified;
+    Date created; ///< birth time where the file system has one, else `modified`
+};
+
+/// The file system, as far as the device's services need it. Paths are absolute. The last component of a path is
+/// never followed when it is a link. Any thread.
+///
+/// A twin in tests/support keeps files in memory and fails on demand.
+class FileSystem {
+public:
+    virtual ~FileSystem() = default;
+
+    /// The whole file, at most `maximumSize` bytes (a larger one is an error, EFBIG).
+    [[nodiscard]] virtual Result<Bytes> read(const std::filesystem::path& path, std::size_t maximumSize) = 0;
+    /// Publishes a file whole: writes a temporary beside it, syncs, renames it over `path`, syncs the directory.
+    /// A failure leaves the old file as it was. Mode 0600.
+    [[nodiscard]] virtual Result<void> writeAtomically(const std::filesystem::path& path, std::string_view contents) = 0;
+    /// Makes the directory and its parents, those made with mode 0700. One that is there already is fine.
+    [[nodiscard]] virtual Result<void> createDirectories(const std::filesystem::path& path) = 0;
+    [[nodiscard]] virtual Result<FileInfo> info(const std::filesystem::path& path) = 0;
+    /// Removes a file; one that isn't there is an error (ENOENT).
+    [[nodiscard]] virtual Result<void> remove(const std::filesystem::path& path) = 0;
+    /// The names in a directory, in no order, without "." and "..".
+    [[nodiscard]] virtual Result<std::vector<std::string>> list(const std::filesystem::path& path) = 0;
+    [[nodiscard]] virtual Result<FileHandle> openForReading(const std::filesystem::path& path) = 0;
+};
+
+[[nodiscard]] std::unique_ptr<FileSystem> makeSystemFiles();
+
+/// The user's directories. Made on first use by whoever writes there, never at start-up.
+struct Directories {
+    std::filesystem::path caches;  ///< $XDG_CACHE_HOME, else ~/.cache
+    std::filesystem::path config;  ///< $XDG_CONFIG_HOME, else ~/.config
+    std::filesystem::path state;   ///< $XDG_STATE_HOME, else ~/.local/state
+    std::filesystem::path data;    ///< $XDG_DATA_HOME, else ~/.local/share
+    std::filesystem::path runtime; ///< $XDG_RUNTIME_DIR, else $TMPDIR/runtime-UID
+    std::filesystem::path temporary; ///< $TMPDIR, else /tmp
+
+    [[nodiscard]] static Directories fromEnvironment();
+};
+
+} // namespace platform

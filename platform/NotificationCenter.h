@@ -1,0 +1,66 @@
+#pragma once
+
+#include <any>
+#include <functional>
+#include <map>
+#include <memory>
+#include <string>
+#include <string_view>
+
+namespace platform {
+
+/// Something that happened, told to whoever observes its name.
+struct Notification {
+    std::string name;
+    const void* object = nullptr; ///< the sender, for observers that listen to one sender only
+    std::map<std::string, std::any, std::less<>> userInfo;
+
+    /// The entry under `key` if it is a `T`, else a default `T` (null, for pointers).
+    template <class T> [[nodiscard]] T get(std::string_view key) const
+    {
+        auto found = userInfo.find(key);
+        if (found == userInfo.end()) return T{};
+        const T* value = std::any_cast<T>(&found->second);
+        return value ? *value : T{};
+    }
+};
+
+/// In-process notifications. Any thread.
+///
+/// `post` calls the observers on the posting thread, in the order in which they registered, from a snapshot and
+/// without a lock: observers may register, unregister and post. Once a token's destruction has returned, its
+/// callback is neither running on another thread nor called again; a token may be destroyed inside its own
+/// callback.
+class NotificationCenter {
+public:
+    using Callback = std::function<void(const Notification&)>;
+
+    /// Unregisters its observer when destroyed.
+    class Token {
+    public:
+        Token() = default;
+        Token(Token&&) noexcept = default;
+        Token& operator=(Token&& other) noexcept;
+        ~Token();
+        [[nodiscard]] explicit operator bool() const { return _observer != nullptr; }
+
+    private:
+        friend class NotificationCenter;
+        struct Observer;
+        std::shared_ptr<Observer> _observer;
+    };
+
+    NotificationCenter();
+    ~NotificationCenter();
+
+    /// Observes `name`; with a sender, only that sender's. The centre may go before the token.
+    [[nodiscard]] Token observe(std::string_view name, Callback callback, const void* sender = nullptr);
+
+    void post(const Notification& notification) const;
+
+private:
+    struct State;
+    std::shared_ptr<State> _state;
+};
+
+} // namespace platform

@@ -1,0 +1,144 @@
+#pragma once
+
+#include <cstdint>
+#include <functional>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <vector>
+
+#include "platform/Bytes.h"
+#include "platform/Date.h"
+#include "platform/Error.h"
+#include "platform/Url.h"
+
+namespace platform {
+
+class Queue;
+
+/// Header fields in the order in which they stand. Names compare without regard to case (RFC 9110).
+class HttpHeaders {
+public:
+    using Entry = std::pair<std::string, std::string>;
+
+    HttpHeaders() = default;
+    HttpHeaders(std::initializer_list<Entry> entries) : _entries(entries) {}
+
+    /// The first field of that name.
+    [[nodiscard]] const std::string* find(std::string_view name) const;
+    /// Sets a field in place of every one of that name.
+    void set(std::string name, std::string value);
+    /// Adds a field beside those that are there.
+    void add(std::string name, std::string value) { _entries.emplace_back(std::move(name), std::move(value)); }
+    void remove(std::string_view name);
+
+    [[nodiscard]] auto begin() const { return _entries.begin(); }
+    [[nodiscard]] auto end() const { return _entries.end(); }
+    [[nodiscard]] std::size_t size() const { return _entries.size(); }
+    [[nodiscard]] bool empty() const { return _entries.empty(); }
+    friend bool operator==(const HttpHeaders&, const HttpHeaders&) = default;
+
+private:
+    std::vector<Entry> _entries;
+};
+
+/// What to load. A plain value.
+struct UrlRequest {
+    Url url;
+    std::string method = "GET";
+    HttpHeaders headers;
+    Bytes body;
+    /// The longest the request may go without receiving anything; none is the session's.
+    std::optional<Duration> timeout;
+    /// ReloadIgnoringCache neither answers from a cache nor asks it for validators.
+    enum class CachePolicy { Protocol, ReloadIgnoringCache } cachePolicy = CachePolicy::Protocol;
+};
+
+/// What came back. An answer to a URL that isn't http or https has no status and `isHttp` false.
+struct UrlResponse {
+    Url url; ///< where the answer came from, after redirects
+    bool isHttp = true;
+    int statusCode = 0;
+    HttpHeaders headers;
+};
+
+/// Errors of URL loading: domain kUrlErrorDomain, codes below, the reason in words.
+inline constexpr std::string_view kUrlErrorDomain = "UrlErrorDomain";
+enum UrlErrorCode : std::int64_t {
+    kUrlCancelled = -999,
+    kUrlBadUrl = -1000,
+    kUrlTimedOut = -1001,
+    kUrlUnsupported = -1002,
+    kUrlCannotFindHost = -1003,
+    kUrlCannotConnect = -1004,
+    kUrlConnectionLost = -1005,
+    kUrlTooManyRedirects = -1007,
+    kUrlNotConnected = -1009,
+    kUrlBadResponse = -1011,
+    kUrlTooLarge = -1103,
+    kUrlTlsFailed = -1200,
+    kUrlForbiddenRedirect = -1201, ///< to another scheme, or from a public host to a private address
+};
+
+/// One load. Made suspended; nothing happens before `resume()`. Any thread.
+///
+/// A task ends exactly once, in its completion; `cancel` ends it with kUrlCancelled. A resumed task keeps itself alive
+/// until then; one that is dropped without `resume()` never completes.
+class UrlTask {
+public:
+    virtual ~UrlTask() = default;
+    virtual void resume() = 0;
+    virtual void cancel() = 0;
+    /// Identifies the task within its session, from 1.
+    [[nodiscard]] virtual std::uint64_t identifier() const = 0;
+    [[nodiscard]] virtual const UrlRequest& originalRequest() const = 0;
+    /// When the stages of the load began and ended, in seconds on the loader's clock, and the peer's address; a
+    /// dictionary whose keys begin with "_kCFNTimingData" (docs/timing.md), null before the completion.
+    [[nodiscard]] virtual Value timingData() const = 0;
+};
+
+/// Loads URLs. Any thread.
+class UrlSession {
+public:
+    /// data: the body, none with a transport error. response: none where none came. error: a transport error; an HTTP
+    /// error status is none.
+    using DataCompletion =
+        std::move_only_function<void(std::optional<Bytes> data, std::optional<UrlResponse> response, std::optional<Error> error)>;
+
+    virtual ~UrlSession() = default;
+    /// `completion` runs on the session's delegate queue.
+    [[nodiscard]] virtual std::shared_ptr<UrlTask> dataTask(UrlRequest request, DataCompletion completion) = 0;
+};
+
+/// How a session loads.
+struct UrlSessionConfiguration {
+    /// Without anything received for this long a request times out.
+    Duration requestTimeout = std::chrono::seconds(60);
+    /// TCP Fast Open and TLS session tickets.
+    bool allowFastOpenAndTickets = false;
+    bool pipelining = false; ///< wait for a connection that may be multiplexed rather than open another
+    /// Idle connections older than this aren't used again; none is curl's default (118 s).
+    std::optional<Duration> connectionPurgeTimeout;
+    std::size_t maximumResponseSize = 64u << 20;
+    unsigned maximumRedirects = 16;
+    /// A PEM file of certification authorities in place of the system's; empty is the system's.
+    std::string caFile;
+};
+
+/// Makes sessions. One for the process; a twin in tests/support answers by hand. Any thread.
+class UrlLoader {
+public:
+    virtual ~UrlLoader() = default;
+    /// A foreground session. `delegateQueue` runs the completions.
+    [[nodiscard]] virtual std::shared_ptr<UrlSession> makeSession(UrlSessionConfiguration configuration,
+                                                                  std::shared_ptr<Queue> delegateQueue) = 0;
+};
+
+/// The URL-loading thread: one libcurl multi handle that all sessions share. The thread is made with the first task.
+/// Destroying the loader cancels what is under way and joins the thread; its sessions must not be used afterwards.
+[[nodiscard]] std::unique_ptr<UrlLoader> makeCurlLoader();
+
+} // namespace platform

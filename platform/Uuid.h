@@ -1,0 +1,36 @@
+#pragma once
+
+#include <array>
+#include <compare>
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <string_view>
+
+namespace platform {
+
+/// A 128-bit identifier (RFC 4122). The default is all zero, `isNil()`.
+class Uuid {
+public:
+    Uuid() = default;
+    explicit Uuid(const std::array<std::uint8_t, 16>& bytes) : _bytes(bytes) {}
+
+    /// A fresh random UUID (version 4) from the cryptographic generator. Any thread.
+    [[nodiscard]] static Uuid random();
+
+    /// Reads the 36-character text form in either case; nothing for any other text.
+    [[nodiscard]] static std::optional<Uuid> parse(std::string_view text);
+
+    /// The 36-character text form, in capitals.
+    [[nodiscard]] std::string string() const;
+
+    [[nodiscard]] bool isNil() const { return _bytes == std::array<std::uint8_t, 16>{}; }
+    [[nodiscard]] const std::array<std::uint8_t, 16>& bytes() const { return _bytes; }
+
+    auto operator<=>(const Uuid&) const = default;
+
+private:
+    std::array<std::uint8_t, 16> _bytes{};
+};
+
+} // namespace platform
