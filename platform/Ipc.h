@@ -39,7 +39,9 @@ struct Member {
     std::string_view name;
     std::string_view in;  ///< of the call, or of the signal
     std::string_view out; ///< of the reply; empty for a signal
-    bool noReply = false; ///< callers are not answered
+    bool noReply = false; ///< the answer is empty; callers needn't ask for it
+    /// The interface that the member belongs to, where that isn't the object's own.
+    std::string_view interface = {};
 };
 
 /// What an exported object offers, and what it pushes.

@@ -1,0 +1,42 @@
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string_view>
+
+/// The words by which ranking features, kinds of client, engagement functions and result placements are named, and which
+/// client a user agent or an identifier belongs to. Pure functions.
+///
+/// The two directions of a pair are not exact inverses, and some names are misspelled: both are relied on by the
+/// service and stay as they are. A missing string reads as the unknown kind.
+namespace tavrin {
+
+enum class FeatureType : std::uint64_t { Domain = 0, MediaType = 1, Topic = 2, Unknown = 3 };
+enum class ClientType : std::uint64_t { Wendral = 0, Vistrel = 1, Unknown = 2 };
+enum class FunctionType : std::uint64_t { Engagements = 0, EngagementRate = 1, Unknown = 2 };
+enum class ResultPlacement : std::uint64_t { Unknown = 0, Top = 1, Bottom = 2 };
+
+using OptionalText = std::optional<std::string_view>;
+
+/// "domain" and "tld", "mediatype" in any case and "mt", "topic".
+[[nodiscard]] FeatureType featureTypeFromString(OptionalText text);
+[[nodiscard]] std::string_view stringFromFeatureType(FeatureType type);
+[[nodiscard]] ClientType clientTypeFromString(OptionalText text);
+[[nodiscard]] std::string_view stringFromClientType(ClientType type);
+/// "eng"; "engrate" and "eng/render" are one and print as the latter.
+[[nodiscard]] FunctionType funcTypeFromString(OptionalText text);
+[[nodiscard]] std::string_view stringFromFunctionType(FunctionType type);
+[[nodiscard]] ResultPlacement resultPlacementFromString(OptionalText text);
+[[nodiscard]] std::string_view stringFromResultPlacement(ResultPlacement placement);
+
+/// "wendral" or "vistrel" if the agent contains it in any case (the former wins), else "unknown".
+[[nodiscard]] std::string_view getClientFromUserAgent(OptionalText userAgent);
+
+/// The first of "wendral", "vistrel", "kivo", "lookup", "messages", "news", "tavrind" that the text contains in any
+/// case; first in that order, not in the text.
+[[nodiscard]] std::optional<std::string_view> extractClientNameFromString(OptionalText text);
+
+/// True if `text` contains `part`, without regard to the case of ASCII letters.
+[[nodiscard]] bool tavrin_caseInsensitiveContainsString(std::string_view text, std::string_view part);
+
+} // namespace tavrin

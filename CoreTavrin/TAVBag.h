@@ -1,0 +1,90 @@
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/Record.h"
+#include "platform/Url.h"
+#include "platform/Value.h"
+
+namespace tavrin {
+
+/// The bag: the service's configuration of the daemon, as one client sees it.
+///
+/// Every accessor reads the top-level key of its own name. A dictionary under "clients" holds, by client name, keys that
+/// override the top level; the name that `extractClientNameFromString` finds in the user agent applies. A key that is
+/// missing or of the wrong type reads as its default. docs/bag.md lists every key.
+///
+/// Immutable and cheap to copy: any thread.
+class TAVBag {
+public:
+    /// Wraps a raw bag, which must be a dictionary (anything else reads as an empty one).
+    TAVBag(platform::Value rawBag, std::string userAgent);
+
+    [[nodiscard]] const platform::Value& rawBag() const { return _rawBag; }
+    [[nodiscard]] const std::string& userAgent() const { return _userAgent; }
+
+    [[nodiscard]] std::string version() const; ///< a string, or a number read as one; ""
+    [[nodiscard]] bool isEnabled() const;      ///< true
+    [[nodiscard]] bool feedbackEnabled() const; ///< true
+    /// UTF-16 units; 1.
+    [[nodiscard]] std::uint64_t minimumQueryLength() const;
+    /// Seconds, above 0; none.
+    [[nodiscard]] std::optional<double> timeoutIntervalForRequest() const;
+
+    [[nodiscard]] std::optional<platform::Url> searchURL() const;
+    [[nodiscard]] std::optional<platform::Url> warmURL() const;
+    [[nodiscard]] std::optional<platform::Url> flightURL() const;
+    [[nodiscard]] std::optional<platform::Url> feedbackURL() const;
+    [[nodiscard]] std::optional<platform::Url> crowdsourcingURL() const;
+    /// The template "imageURL" with its "{id}" replaced by the identifier, percent-encoded.
+    [[nodiscard]] std::optional<platform::Url> urlForIdentifier(std::string_view identifier) const;
+    /// The URL of a downloadable resource, by the resource's identifier.
+    [[nodiscard]] std::optional<platform::Url> resourceURL(std::string_view identifier) const;
+
+    [[nodiscard]] bool sendGeoEnvironmentHeader() const;                      ///< false
+    [[nodiscard]] std::vector<std::string> supportedGeoLocationSources() const; ///< of "gps", "cell", "wifi"; none
+    [[nodiscard]] std::optional<bool> hashtagImagesVisible() const;           ///< none: leave as it is
+    [[nodiscard]] std::optional<std::vector<std::string>> subscriptionProviderDomainWhitelist() const;
+    [[nodiscard]] std::optional<std::vector<std::string>> subscriptionProviderBundleIdentifierWhitelist() const;
+    [[nodiscard]] double subscriptionTTL() const; ///< seconds; 86400
+
+    /// One text for each key, in either view, whose value has the wrong type and is not looked at.
+    [[nodiscard]] std::vector<std::string> problems() const;
+
+private:
+    [[nodiscard]] const platform::Value& get(std::string_view key) const;
+    [[nodiscard]] std::optional<platform::Url> url(std::string_view key) const;
+    [[nodiscard]] bool boolean(std::string_view key, bool fallback) const;
+    [[nodiscard]] std::optional<std::vector<std::string>> strings(std::string_view key) const;
+
+    platform::Value _rawBag;
+    platform::Value _clientView; // the overriding keys, or null
+    std::string _userAgent;
+};
+
+/// Identifiers of the downloadable resources, in the order in which they are processed.
+extern const std::vector<std::string_view> kTAVResourceIdentifiers;
+
+/// A bag on its way over IPC.
+struct TAVBagRecord : platform::RecordOf<TAVBagRecord> {
+    static constexpr std::string_view kClass = "TAVBag";
+    platform::Bytes rawBag; ///< JSON text
+    std::string userAgent;
+
+    TAVBagRecord() = default;
+    explicit TAVBagRecord(const TAVBag& bag);
+    /// None if the text is no JSON object.
+    [[nodiscard]] std::shared_ptr<const TAVBag> bag() const;
+    static constexpr auto fields()
+    {
+        return std::tuple{platform::field("rawBag", &TAVBagRecord::rawBag),
+                          platform::field("userAgent", &TAVBagRecord::userAgent)};
+    }
+};
+
+} // namespace tavrin

@@ -1,0 +1,27 @@
+#pragma once
+
+#include <string>
+#include <string_view>
+
+#include "platform/Error.h"
+
+namespace tavrin {
+
+/// The domain of every error that the daemon makes itself.
+inline constexpr std::string_view TAVErrorDomain = "TAVErrorDomain";
+
+/// Codes in `TAVErrorDomain`.
+enum TAVErrorCode : std::int64_t {
+    TAVErrorTimeout = 1,         ///< no bag in time ("timeout"), or no user agent yet ("no UserAgent")
+    TAVErrorBagFetch = 2,        ///< the bag could not be fetched
+    TAVErrorNotFound = 404,      ///< no such resource
+    TAVErrorInvalidResponse = 500, ///< an answer or a configuration that makes no sense
+};
+
+/// An error of the daemon's with its "reason".
+[[nodiscard]] inline platform::Error makeTAVError(std::int64_t code, std::string reason)
+{
+    return platform::Error::withReason(std::string(TAVErrorDomain), code, std::move(reason));
+}
+
+} // namespace tavrin

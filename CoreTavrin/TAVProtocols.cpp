@@ -1,0 +1,273 @@
+#include "CoreTavrin/TAVProtocols.h"
+
+#include <fmt/format.h>
+
+#include "CoreTavrin/TAVBag.h"
+#include "CoreTavrin/TAVRecordClasses.h"
+#include "CoreTavrin/TAVReply.h"
+#include "CoreTavrin/TAVRequest.h"
+#include "CoreTavrin/TAVSessionConfiguration.h"
+#include "searchrecords/ZRFeedback.h"
+
+#include "docs_ipc_xml.h" // made from docs/ipc/*.xml
+
+namespace tavrin {
+
+namespace ipc = platform::ipc;
+using platform::Dictionary;
+using platform::Reply;
+using platform::Value;
+
+namespace {
+
+constexpr std::string_view kDiagnostics = "com.quorvane.TAVDiagnosticsXPC";
+
+/// Decodes argument `index`, which is called `name` in the interface, as a record of class T. An unknown class is told
+/// apart from a broken record: it is not an error on the wire.
+enum class Refusal { Malformed, UnknownClass };
+template <class T>
+std::expected<std::shared_ptr<T>, Refusal> record(const ipc::Message& message, std::size_t index, std::string_view name,
+                                                  ipc::Responder& reply)
+{
+    auto decoded = platform::castRecord<T>(platform::recordFromValue(message.args[index], coreRecordClasses()));
+    if (decoded) return std::move(*decoded);
+    if (decoded.error().code == platform::Decoder::kUnknownClass) return std::unexpected(Refusal::UnknownClass);
+    reply(std::unexpected(ipc::CallError{.message = fmt::format("{}: {}", name, decoded.error().reason())}));
+    return std::unexpected(Refusal::Malformed);
+}
+
+ipc::Message message(std::vector<Value> args)
+{
+    return {std::move(args), {}};
+}
+
+std::string text(const ipc::Message& message, std::size_t index)
+{
+    const std::string* string = message.args[index].asString();
+    return string ? *string : std::string();
+}
+
+Value bagValue(const std::shared_ptr<const TAVBag>& bag)
+{
+    return bag ? platform::toValue(TAVBagRecord(*bag)) : Value(Dictionary());
+}
+
+/// A typed reply that encodes itself into the responder, and frees it when it is abandoned.
+template <class... Args, class Encode> Reply<Args...> replyThrough(ipc::Responder responder, Encode encode)
+{
+    auto shared = std::make_shared<ipc::Responder>(std::move(responder));
+    return Reply<Args...>([shared, encode](Args... args) mutable { (*shared)(encode(std::forward<Args>(args)...)); },
+                          [shared] { shared->abandon(); });
+}
+
+RequestReply requestReply(ipc::Responder responder)
+{
+    return replyThrough<std::int64_t, std::shared_ptr<TAVReply>, OptionalError>(
+        std::move(responder),
+        [](std::int64_t queryId, const std::shared_ptr<TAVReply>& reply, const OptionalError& error) {
+            return message({queryId, reply ? platform::toValue(*reply) : Value(Dictionary()), valueFromError(error)});
+        });
+}
+
+class ClientProxy final : public TAVClientXPC {
+public:
+    explicit ClientProxy(std::weak_ptr<ipc::Connection> connection) : _connection(std::move(connection)) {}
+    void bagDidLoad(const std::shared_ptr<const TAVBag>& bag, const OptionalError& error) override
+    {
+        if (auto connection = _connection.lock())
+            connection->push("BagDidLoad", message({bagValue(bag), valueFromError(error)}));
+    }
+
+private:
+    std::weak_ptr<ipc::Connection> _connection;
+};
+
+class FlusherListenerProxy final : public TAVFlusherListener {
+public:
+    explicit FlusherListenerProxy(std::weak_ptr<ipc::Connection> connection) : _connection(std::move(connection)) {}
+    void flushedData(const platform::Bytes& body) override { push("FlushedData", {body}); }
+    void receivedFeedbackDescription(const std::string& description) override
+    {
+        push("ReceivedFeedbackDescription", {description});
+    }
+    void workDone() override { push("WorkDone", {}); }
+
+private:
+    void push(std::string_view signal, std::vector<Value> args)
+    {
+        if (auto connection = _connection.lock()) connection->push(signal, message(std::move(args)));
+    }
+    std::weak_ptr<ipc::Connection> _connection;
+};
+
+} // namespace
+
+Value valueFromError(const OptionalError& error)
+{
+    if (!error) return Dictionary();
+    Value userInfo = error->userInfo;
+    if (!userInfo.asDictionary()) userInfo = Dictionary();
+    return Value::dictionaryOf({{"domain", error->domain}, {"code", error->code}, {"userInfo", std::move(userInfo)}});
+}
+
+OptionalError errorFromValue(const Value& value)
+{
+    const std::string* domain = value["domain"].asString();
+    if (!domain) return std::nullopt;
+    return platform::Error(*domain, value["code"].asInt().value_or(0), value["userInfo"]);
+}
+
+const ipc::Interface& daemonInterface()
+{
+    static const ipc::Interface interface{
+        .name = "com.quorvane.TAVDaemonXPC",
+        .methods = {{"Configure", "a{sv}", "s"},
+                    {"Bag", "", "a{sv}a{sv}"},
+                    {"Request", "a{sv}", "xa{sv}a{sv}"},
+                    {"ReportEvent", "sxa{sv}", "", true},
+                    {"Feedback", "s", "aa{sv}a{sv}"},
+                    {"ListenToFlusher", "", "s"},
+                    {"ListSessions", "", "aa{sv}"},
+                    {"FileHandleAndAttributesForResource", "s", "aha{sv}a{sv}"},
+                    {"Status", "", "a{sv}", false, kDiagnostics},
+                    {"Statistics", "", "s", false, kDiagnostics}},
+        .listenerName = "com.quorvane.TAVClientXPC",
+        .signals = {{"BagDidLoad", "a{sv}a{sv}", ""}},
+        .introspection = kDaemonIntrospection,
+    };
+    return interface;
+}
+
+const ipc::Interface& endpointInterface()
+{
+    static const ipc::Interface interface{
+        .name = "com.quorvane.TAVEndpointXPC",
+        .methods = {{"Request", "a{sv}a{sv}", "xa{sv}a{sv}"}, {"LoadImages", "aa{sv}t", "a{sv}"}},
+        .listenerName = "",
+        .signals = {},
+        .introspection = kEndpointIntrospection,
+    };
+    return interface;
+}
+
+const ipc::Interface& flusherInterface()
+{
+    static const ipc::Interface interface{
+        .name = "com.quorvane.TAVFlusherXPC",
+        .methods = {{"InitiateConnectionWithIntent", "t", ""}},
+        .listenerName = "com.quorvane.TAVFlusherListener",
+        .signals = {{"FlushedData", "ay", ""}, {"ReceivedFeedbackDescription", "s", ""}, {"WorkDone", "", ""}},
+        .introspection = kFlusherIntrospection,
+    };
+    return interface;
+}
+
+ipc::Handler daemonHandler(std::weak_ptr<TAVDaemonXPC> object, std::weak_ptr<TAVDiagnosticsXPC> diagnostics)
+{
+    return [object, diagnostics](std::string_view member, ipc::Message arguments, ipc::Responder reply) {
+        if (member == "Status" || member == "Statistics") {
+            auto source = diagnostics.lock();
+            if (!source) return reply.abandon();
+            return reply(message({member == "Status" ? source->status() : Value(source->statistics())}));
+        }
+
+        auto daemon = object.lock();
+        if (!daemon) return reply.abandon();
+
+        if (member == "Configure") {
+            auto configuration = record<TAVSessionConfiguration>(arguments, 0, "configuration", reply);
+            if (!configuration && configuration.error() == Refusal::Malformed) return;
+            daemon->configure(configuration.value_or(nullptr),
+                              replyThrough<std::string>(std::move(reply), [](std::string endpoint) {
+                                  return message({std::move(endpoint)});
+                              }));
+        } else if (member == "Bag") {
+            daemon->bag(replyThrough<std::shared_ptr<const TAVBag>, OptionalError>(
+                std::move(reply), [](const std::shared_ptr<const TAVBag>& bag, const OptionalError& error) {
+                    return message({bagValue(bag), valueFromError(error)});
+                }));
+        } else if (member == "Request") {
+            auto request = record<TAVRequest>(arguments, 0, "request", reply);
+            if (request) return daemon->request(std::move(*request), requestReply(std::move(reply)));
+            if (request.error() == Refusal::UnknownClass) reply.abandon();
+        } else if (member == "ReportEvent") {
+            auto feedback = record<ZRFeedback>(arguments, 2, "feedback", reply);
+            if (!feedback && feedback.error() == Refusal::Malformed) return;
+            if (feedback) daemon->reportEvent(text(arguments, 0), *arguments.args[1].asInt(), std::move(*feedback));
+            reply(message({}));
+        } else if (member == "Feedback") {
+            daemon->feedback(text(arguments, 0),
+                             replyThrough<Value::Array, OptionalError>(
+                                 std::move(reply), [](Value::Array feedbacks, const OptionalError& error) {
+                                     return message({std::move(feedbacks), valueFromError(error)});
+                                 }));
+        } else if (member == "ListenToFlusher") {
+            daemon->listenToFlusher(replyThrough<std::string>(
+                std::move(reply), [](std::string endpoint) { return message({std::move(endpoint)}); }));
+        } else if (member == "ListSessions") {
+            daemon->listSessions(replyThrough<Value::Array>(
+                std::move(reply), [](Value::Array sessions) { return message({std::move(sessions)}); }));
+        } else if (member == "FileHandleAndAttributesForResource") {
+            daemon->fileHandleAndAttributesForResource(
+                text(arguments, 0),
+                replyThrough<platform::FileHandle, Value, OptionalError>(
+                    std::move(reply), [](platform::FileHandle file, Value attributes, const OptionalError& error) {
+                        if (!attributes.asDictionary()) attributes = Dictionary();
+                        ipc::Message answer;
+                        Value::Array indexes;
+                        if (file) {
+                            indexes.emplace_back(0);
+                            answer.handles.push_back(std::move(file));
+                        }
+                        answer.args = {std::move(indexes), std::move(attributes), valueFromError(error)};
+                        return answer;
+                    }));
+        } else {
+            reply.abandon();
+        }
+    };
+}
+
+ipc::Handler endpointHandler(std::weak_ptr<TAVEndpointXPC> object)
+{
+    return [object](std::string_view member, ipc::Message arguments, ipc::Responder reply) {
+        auto endpoint = object.lock();
+        if (!endpoint) return reply.abandon();
+
+        if (member == "Request") {
+            auto configuration = record<TAVSessionConfiguration>(arguments, 1, "configuration", reply);
+            if (!configuration && configuration.error() == Refusal::Malformed) return;
+            auto request = record<TAVRequest>(arguments, 0, "request", reply);
+            if (request)
+                return endpoint->request(std::move(*request), configuration.value_or(nullptr), requestReply(std::move(reply)));
+            if (request.error() == Refusal::UnknownClass) reply.abandon();
+        } else if (member == "LoadImages") {
+            endpoint->loadImages(*arguments.args[0].asArray(), arguments.args[1].asUInt().value_or(0),
+                                 replyThrough<Value>(std::move(reply), [](Value images) {
+                                     return message({images.asDictionary() ? std::move(images) : Value(Dictionary())});
+                                 }));
+        } else {
+            reply.abandon();
+        }
+    };
+}
+
+ipc::Handler flusherHandler(std::weak_ptr<TAVFlusherXPC> object)
+{
+    return [object](std::string_view, ipc::Message arguments, ipc::Responder reply) {
+        if (auto flusher = object.lock()) flusher->initiateConnectionWithIntent(arguments.args[0].asUInt().value_or(0));
+        reply(message({}));
+    };
+}
+
+std::shared_ptr<TAVClientXPC> makeClientProxy(std::weak_ptr<ipc::Connection> connection)
+{
+    return std::make_shared<ClientProxy>(std::move(connection));
+}
+
+std::shared_ptr<TAVFlusherListener> makeFlusherListenerProxy(std::weak_ptr<ipc::Connection> connection)
+{
+    return std::make_shared<FlusherListenerProxy>(std::move(connection));
+}
+
+} // namespace tavrin

@@ -1,0 +1,112 @@
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/Ipc.h"
+#include "platform/Reply.h"
+#include "platform/Value.h"
+
+/// The protocols that clients and the daemon speak, as types on the one side and as D-Bus interfaces on the other, and
+/// the thin adaptors between the two. docs/ipc.md describes the wire.
+namespace tavrin {
+
+struct TAVReply;
+struct TAVRequest;
+struct TAVSessionConfiguration;
+class TAVBag;
+struct ZRFeedback;
+
+using OptionalError = std::optional<platform::Error>;
+using BagReply = platform::Reply<std::shared_ptr<const TAVBag>, OptionalError>;
+/// (query id, reply or none, error or none): every request is answered once, or not at all where its kind isn't served.
+using RequestReply = platform::Reply<std::int64_t, std::shared_ptr<TAVReply>, OptionalError>;
+using ResourceReply = platform::Reply<platform::FileHandle, platform::Value, OptionalError>;
+
+/// What the daemon offers a client. Calls arrive on the connection's queue.
+class TAVDaemonXPC {
+public:
+    virtual ~TAVDaemonXPC() = default;
+    /// Introduces the client; answers the address of the endpoint for `TAVEndpointXPC`. An invalid configuration is not
+    /// answered: the connection is closed.
+    virtual void configure(std::shared_ptr<TAVSessionConfiguration> configuration, platform::Reply<std::string> reply) = 0;
+    virtual void bag(BagReply reply) = 0;
+    virtual void request(std::shared_ptr<TAVRequest> request, RequestReply reply) = 0;
+    virtual void reportEvent(const std::string& event, std::int64_t queryId, std::shared_ptr<ZRFeedback> feedback) = 0;
+    /// The current session's feedback, as the dictionaries that are uploaded, with relative times.
+    virtual void feedback(const std::string& argument, platform::Reply<platform::Value::Array, OptionalError> reply) = 0;
+    /// The address of the flusher bridge, for `TAVFlusherXPC`.
+    virtual void listenToFlusher(platform::Reply<std::string> reply) = 0;
+    /// One {"identifier", "agent"} for each client known.
+    virtual void listSessions(platform::Reply<platform::Value::Array> reply) = 0;
+    virtual void fileHandleAndAttributesForResource(const std::string& resource, ResourceReply reply) = 0;
+};
+
+/// What the daemon reports about itself, to whoever diagnoses it; needs no configuration.
+class TAVDiagnosticsXPC {
+public:
+    virtual ~TAVDiagnosticsXPC() = default;
+    /// What the daemon is doing, as a dictionary for people and scripts to read.
+    virtual platform::Value status() = 0;
+    /// The statistics counters as OpenMetrics text.
+    virtual std::string statistics() = 0;
+};
+
+/// What a client is told. Any thread.
+class TAVClientXPC {
+public:
+    virtual ~TAVClientXPC() = default;
+    virtual void bagDidLoad(const std::shared_ptr<const TAVBag>& bag, const OptionalError& error) = 0;
+};
+
+/// What is served on the endpoint that `configure` answers. Calls arrive on that connection's queue.
+class TAVEndpointXPC {
+public:
+    virtual ~TAVEndpointXPC() = default;
+    /// More results and cards; other kinds are not answered.
+    virtual void request(std::shared_ptr<TAVRequest> request, std::shared_ptr<TAVSessionConfiguration> configuration,
+                         RequestReply reply) = 0;
+    /// The bytes of images by "url" or "id", as many as are there within `timeout` nanoseconds.
+    virtual void loadImages(platform::Value::Array images, std::uint64_t timeout, platform::Reply<platform::Value> reply) = 0;
+};
+
+/// What the flusher bridge takes from a diagnostic tool. Calls arrive on that connection's queue.
+class TAVFlusherXPC {
+public:
+    virtual ~TAVFlusherXPC() = default;
+    virtual void initiateConnectionWithIntent(std::uint64_t intent) = 0;
+};
+
+/// What the flusher bridge tells its tool. Any thread.
+class TAVFlusherListener {
+public:
+    virtual ~TAVFlusherListener() = default;
+    virtual void flushedData(const platform::Bytes& body) = 0;
+    virtual void receivedFeedbackDescription(const std::string& description) = 0;
+    virtual void workDone() = 0;
+};
+
+/// The interfaces of the three kinds of connection.
+[[nodiscard]] const platform::ipc::Interface& daemonInterface();
+[[nodiscard]] const platform::ipc::Interface& endpointInterface();
+[[nodiscard]] const platform::ipc::Interface& flusherInterface();
+
+/// Handlers that decode a call, make it on the object and encode its answer. A call to an object that is gone is not
+/// answered.
+[[nodiscard]] platform::ipc::Handler daemonHandler(std::weak_ptr<TAVDaemonXPC> object,
+                                                   std::weak_ptr<TAVDiagnosticsXPC> diagnostics);
+[[nodiscard]] platform::ipc::Handler endpointHandler(std::weak_ptr<TAVEndpointXPC> object);
+[[nodiscard]] platform::ipc::Handler flusherHandler(std::weak_ptr<TAVFlusherXPC> object);
+
+/// The peer's side of a connection, which the proxy doesn't keep alive.
+[[nodiscard]] std::shared_ptr<TAVClientXPC> makeClientProxy(std::weak_ptr<platform::ipc::Connection> connection);
+[[nodiscard]] std::shared_ptr<TAVFlusherListener> makeFlusherListenerProxy(std::weak_ptr<platform::ipc::Connection> connection);
+
+/// An error as a{sv} (domain, code, userInfo), the empty dictionary for none; and back.
+[[nodiscard]] platform::Value valueFromError(const OptionalError& error);
+[[nodiscard]] OptionalError errorFromValue(const platform::Value& value);
+
+} // namespace tavrin

@@ -1,0 +1,39 @@
+#pragma once
+
+#include <optional>
+#include <string>
+
+#include "platform/Record.h"
+
+namespace tavrin {
+
+/// Who a client is and how it wants to be served; the first thing that it sends.
+struct TAVSessionConfiguration : platform::RecordOf<TAVSessionConfiguration> {
+    static constexpr std::string_view kClass = "TAVSessionConfiguration";
+
+    /// The client's session identifier, "com.quorvane.vistrel". Connections with the same one share cache and session.
+    std::optional<std::string> identifier;
+    /// A name/version token, "Vistrel/4.2". It is sent to the service and selects the client's view of the bag.
+    std::optional<std::string> userAgent;
+    /// Images of search answers are not fetched ahead.
+    bool dontPreloadImages = false;
+    /// Seconds that a request may go without an answer; 0 leaves it to the bag.
+    double timeoutIntervalForRequest = 0;
+
+    TAVSessionConfiguration() = default;
+    TAVSessionConfiguration(std::string identifier_, std::string userAgent_)
+        : identifier(std::move(identifier_)), userAgent(std::move(userAgent_))
+    {
+    }
+
+    static constexpr auto fields()
+    {
+        using Self = TAVSessionConfiguration;
+        return std::tuple{platform::field("identifier", &Self::identifier),
+                          platform::field("userAgent", &Self::userAgent),
+                          platform::field("dontPreloadImages", &Self::dontPreloadImages),
+                          platform::field("timeoutIntervalForRequest", &Self::timeoutIntervalForRequest)};
+    }
+};
+
+} // namespace tavrin
