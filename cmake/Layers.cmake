@@ -7,7 +7,7 @@ find_package(spdlog REQUIRED)
 
 add_library(house INTERFACE)
 target_include_directories(house INTERFACE ${PROJECT_SOURCE_DIR})
-target_compile_options(house INTERFACE -Wall -Wextra -Wshadow -Wnon-virtual-dtor -Wimplicit-fallthrough -Werror)
+target_compile_options(house INTERFACE -Wall -Wextra -Wshadow=local -Wno-missing-field-initializers -Wnon-virtual-dtor -Wimplicit-fallthrough -Werror)
 target_link_libraries(house INTERFACE Threads::Threads)
 if(TAVRIND_SANITIZE)
   target_compile_options(house INTERFACE -fsanitize=${TAVRIND_SANITIZE} -fno-omit-frame-pointer -fno-sanitize-recover=all)

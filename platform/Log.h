@@ -51,7 +51,7 @@ public:
     static std::atomic<LogLevel> threshold;
 
 private:
-    template <class... Args> void write(LogLevel level, fmt::format_string<Args...> text, Args&&... args) const
+    template <class... Args> void write(LogLevel level, fmt::string_view text, const Args&... args) const
     {
         if (enabled(level)) emit(level, fmt::vformat(text, fmt::make_format_args(args...)));
     }

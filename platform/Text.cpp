@@ -1,0 +1,19 @@
+#include "platform/Text.h"
+
+namespace platform {
+
+std::size_t utf16Length(std::string_view text)
+{
+    std::size_t units = 0;
+    for (std::size_t i = 0; i < text.size();) {
+        const auto lead = static_cast<unsigned char>(text[i]);
+        const std::size_t length = lead < 0x80 ? 1 : lead < 0xc2 ? 0 : lead < 0xe0 ? 2 : lead < 0xf0 ? 3 : lead < 0xf5 ? 4 : 0;
+        bool valid = length > 0 && i + length <= text.size();
+        for (std::size_t k = 1; valid && k < length; ++k) valid = (static_cast<unsigned char>(text[i + k]) & 0xc0) == 0x80;
+        units += valid && length == 4 ? 2 : 1;
+        i += valid ? length : 1;
+    }
+    return units;
+}
+
+} // namespace platform
