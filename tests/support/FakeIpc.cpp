@@ -1,0 +1,316 @@
+#include "tests/support/FakeIpc.h"
+
+#include <algorithm>
+
+#include <gtest/gtest.h>
+
+namespace platform::test {
+
+namespace {
+
+std::string_view nextType(std::string_view signature)
+{
+    if (signature.starts_with("a{sv}")) return signature.substr(0, 5);
+    std::size_t length = 1;
+    if (signature.starts_with('a')) length += nextType(signature.substr(1)).size();
+    return signature.substr(0, length);
+}
+
+bool travels(const Value& value)
+{
+    if (const auto* array = value.asArray()) return std::ranges::all_of(*array, travels);
+    if (const auto* dictionary = value.asDictionary())
+        return std::ranges::all_of(*dictionary, [](const auto& entry) { return travels(entry.second); });
+    return !value.isNull();
+}
+
+bool fits(std::string_view type, const Value& value, std::size_t handleCount)
+{
+    if (type == "a{sv}") return value.asDictionary() && travels(value);
+    if (type == "ay") return value.asBytes() != nullptr;
+    if (type.starts_with('a')) {
+        const auto* array = value.asArray();
+        return array && std::ranges::all_of(
+                            *array, [&](const Value& element) { return fits(type.substr(1), element, handleCount); });
+    }
+    switch (type[0]) {
+    case 's': return value.asString() != nullptr;
+    case 'x':
+    case 'i': return value.asInt().has_value();
+    case 't':
+    case 'u': return value.asUInt().has_value();
+    case 'd': return value.asDouble().has_value();
+    case 'b': return value.asBool().has_value();
+    case 'h': return value.asUInt().value_or(handleCount) < handleCount;
+    default: return false;
+    }
+}
+
+const ipc::Member* find(const std::vector<ipc::Member>& members, std::string_view name)
+{
+    auto found = std::ranges::find(members, name, &ipc::Member::name);
+    return found == members.end() ? nullptr : &*found;
+}
+
+void expectShape(std::string_view what, std::string_view signature, const ipc::Message& message)
+{
+    if (auto mismatch = shapeMismatch(signature, message)) ADD_FAILURE() << what << ": " << *mismatch;
+}
+
+} // namespace
+
+std::optional<std::string> shapeMismatch(std::string_view signature, const ipc::Message& message)
+{
+    std::size_t index = 0;
+    for (; !signature.empty(); ++index) {
+        const auto type = nextType(signature);
+        signature.remove_prefix(type.size());
+        if (index >= message.args.size()) return "too few arguments";
+        if (!fits(type, message.args[index], message.handles.size()))
+            return "argument " + std::to_string(index) + " is not " + std::string(type) + ": " +
+                   toJson(message.args[index]);
+    }
+    if (index < message.args.size()) return "too many arguments";
+    return std::nullopt;
+}
+
+FakeCall::State FakeCall::state() const
+{
+    std::lock_guard lock(_mutex);
+    return _state;
+}
+
+Value FakeCall::argument(std::size_t index) const
+{
+    std::lock_guard lock(_mutex);
+    return _result && *_result && index < (*_result)->args.size() ? (*_result)->args[index] : Value();
+}
+
+ipc::CallResult FakeCall::take()
+{
+    std::lock_guard lock(_mutex);
+    if (!_result) return std::unexpected(ipc::CallError{.name = "test.NoAnswer", .message = "there is no answer"});
+    return *std::exchange(_result, std::nullopt);
+}
+
+void FakeCall::wait()
+{
+    std::unique_lock lock(_mutex);
+    _settled.wait(lock, [&] { return _state != State::Pending; });
+}
+
+void FakeCall::settle(State state, std::optional<ipc::CallResult> result)
+{
+    std::lock_guard lock(_mutex);
+    _state = state;
+    _result = std::move(result);
+    _settled.notify_all();
+}
+
+FakeConnection::FakeConnection(const ipc::Interface& interface, ipc::Peer peer, std::shared_ptr<Queue> queue)
+    : _interface(interface), _peer(peer), _queue(std::move(queue))
+{}
+
+std::shared_ptr<FakeCall> FakeConnection::call(std::string_view member, std::vector<Value> args)
+{
+    return call(member, ipc::Message{std::move(args), {}});
+}
+
+std::shared_ptr<FakeCall> FakeConnection::call(std::string_view member, ipc::Message arguments)
+{
+    auto call = std::make_shared<FakeCall>();
+    const ipc::Member* found = find(_interface.methods, member);
+    if (!found) {
+        ADD_FAILURE() << _interface.name << " has no method " << member;
+        return call;
+    }
+    expectShape(member, found->in, arguments);
+
+    std::lock_guard lock(_mutex);
+    if (!_resumed || _invalidated) {
+        call->settle(FakeCall::State::Abandoned, std::nullopt);
+        return call;
+    }
+    _queue->async([dropped = _dropCalls, handler = _handler, name = found->name, out = found->out, call,
+                   arguments = std::move(arguments)]() mutable {
+        if (*dropped) return call->settle(FakeCall::State::Abandoned, std::nullopt);
+        ipc::Responder reply(
+            [call, name, out](ipc::CallResult result) {
+                if (result) expectShape(name, out, *result);
+                call->settle(FakeCall::State::Answered, std::move(result));
+            },
+            [call] { call->settle(FakeCall::State::Abandoned, std::nullopt); });
+        if (handler && *handler)
+            (*handler)(name, std::move(arguments), std::move(reply));
+        else
+            reply.abandon();
+    });
+    return call;
+}
+
+void FakeConnection::end()
+{
+    finish(false);
+}
+
+void FakeConnection::invalidate()
+{
+    finish(true);
+}
+
+void FakeConnection::finish(bool dropQueuedCalls)
+{
+    std::lock_guard lock(_mutex);
+    if (dropQueuedCalls) *_dropCalls = true;
+    if (std::exchange(_invalidated, true)) return;
+    _handler.reset();
+    if (_invalidationHandler) _queue->async(std::exchange(_invalidationHandler, {}));
+}
+
+std::vector<FakePush> FakeConnection::takePushes()
+{
+    std::lock_guard lock(_mutex);
+    return std::exchange(_pushes, {});
+}
+
+std::size_t FakeConnection::pushCount() const
+{
+    std::lock_guard lock(_mutex);
+    return _pushes.size();
+}
+
+void FakeConnection::waitForPushes(std::size_t count)
+{
+    std::unique_lock lock(_mutex);
+    _pushed.wait(lock, [&] { return _pushes.size() >= count; });
+}
+
+bool FakeConnection::resumed() const
+{
+    std::lock_guard lock(_mutex);
+    return _resumed;
+}
+
+bool FakeConnection::invalidated() const
+{
+    std::lock_guard lock(_mutex);
+    return _invalidated;
+}
+
+void FakeConnection::exportObject(ipc::Handler handler)
+{
+    std::lock_guard lock(_mutex);
+    EXPECT_FALSE(_resumed) << "exportObject after resume";
+    _handler = std::make_shared<ipc::Handler>(std::move(handler));
+}
+
+void FakeConnection::setInvalidationHandler(std::move_only_function<void()> handler)
+{
+    std::lock_guard lock(_mutex);
+    EXPECT_FALSE(_resumed) << "setInvalidationHandler after resume";
+    _invalidationHandler = std::move(handler);
+}
+
+void FakeConnection::resume()
+{
+    std::lock_guard lock(_mutex);
+    _resumed = true;
+}
+
+void FakeConnection::push(std::string_view signal, ipc::Message arguments)
+{
+    const ipc::Member* found = find(_interface.signals, signal);
+    if (!found) {
+        ADD_FAILURE() << _interface.name << " has no signal " << signal;
+        return;
+    }
+    expectShape(signal, found->in, arguments);
+    std::lock_guard lock(_mutex);
+    if (_invalidated) return;
+    _pushes.push_back({std::string(signal), std::move(arguments)});
+    _pushed.notify_all();
+}
+
+/// Shared by a listener, which its service owns, and the transport, which only knows it while that lives.
+struct FakeTransport::Endpoint {
+    const ipc::Interface interface;
+    const std::string label;
+    const std::string address;
+    std::mutex mutex{};
+    ipc::Listener::Acceptor acceptor{};
+    bool resumed = false;
+};
+
+class FakeTransport::FakeListener final : public ipc::Listener {
+public:
+    explicit FakeListener(std::shared_ptr<Endpoint> endpoint) : _endpoint(std::move(endpoint)) {}
+    void setAcceptor(Acceptor acceptor) override
+    {
+        std::lock_guard lock(_endpoint->mutex);
+        _endpoint->acceptor = std::move(acceptor);
+    }
+    void resume() override
+    {
+        std::lock_guard lock(_endpoint->mutex);
+        _endpoint->resumed = true;
+    }
+    [[nodiscard]] std::string endpoint() const override { return _endpoint->address; }
+
+private:
+    const std::shared_ptr<Endpoint> _endpoint;
+};
+
+std::unique_ptr<ipc::Listener> FakeTransport::make(const ipc::Interface& interface, const std::string& label)
+{
+    std::lock_guard lock(_mutex);
+    auto address = "unix:path=/fake/" + std::to_string(_endpoints.size());
+    auto endpoint = std::make_shared<Endpoint>(interface, label, std::move(address));
+    _endpoints.push_back(endpoint);
+    return std::make_unique<FakeListener>(std::move(endpoint));
+}
+
+std::shared_ptr<FakeConnection> FakeTransport::connect(std::string_view interfaceOrAddress, ipc::Peer peer)
+{
+    std::shared_ptr<Endpoint> endpoint;
+    {
+        std::lock_guard lock(_mutex);
+        for (const auto& candidate : _endpoints)
+            if (auto living = candidate.lock())
+                if (living->interface.name == interfaceOrAddress || living->address == interfaceOrAddress)
+                    endpoint = std::move(living);
+    }
+    if (!endpoint) return nullptr;
+
+    ipc::Listener::Acceptor acceptor;
+    {
+        std::lock_guard lock(endpoint->mutex);
+        if (endpoint->resumed) acceptor = endpoint->acceptor;
+    }
+    if (!acceptor) return nullptr;
+    auto queue = Queue::make(endpoint->label, Queue::Kind::Serial, _executor, _clock);
+    auto connection = std::make_shared<FakeConnection>(endpoint->interface, peer, std::move(queue));
+    acceptor(connection);
+    return connection;
+}
+
+void FakeTransport::failNextListen(Error error)
+{
+    std::lock_guard lock(_mutex);
+    _listenFailure = std::move(error);
+}
+
+Result<std::unique_ptr<ipc::Listener>> FakeTransport::listen(const ipc::Interface& interface, const std::string& label)
+{
+    {
+        std::lock_guard lock(_mutex);
+        if (_listenFailure) return std::unexpected(*std::exchange(_listenFailure, std::nullopt));
+    }
+    return make(interface, label);
+}
+
+std::unique_ptr<ipc::Listener> FakeTransport::anonymous(const ipc::Interface& interface, const std::string& label)
+{
+    return make(interface, label);
+}
+
+} // namespace platform::test

@@ -1,0 +1,125 @@
+#pragma once
+
+#include <atomic>
+#include <condition_variable>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/Ipc.h"
+
+namespace platform {
+class Clock;
+}
+
+namespace platform::test {
+
+/// What became of a call that a test made. Any thread.
+class FakeCall {
+public:
+    enum class State { Pending, Answered, Abandoned };
+    [[nodiscard]] State state() const;
+    [[nodiscard]] bool pending() const { return state() == State::Pending; }
+    [[nodiscard]] bool answered() const { return state() == State::Answered; }
+    [[nodiscard]] bool abandoned() const { return state() == State::Abandoned; }
+    /// The answer's argument at `index`; the null value while there is none or for an error.
+    [[nodiscard]] Value argument(std::size_t index) const;
+    /// The whole answer, taken out; only once it is there.
+    [[nodiscard]] ipc::CallResult take();
+    /// Blocks until the call is answered or abandoned: for tests that run a worker pool.
+    void wait();
+
+private:
+    friend class FakeConnection;
+    void settle(State state, std::optional<ipc::CallResult> result);
+    mutable std::mutex _mutex;
+    std::condition_variable _settled;
+    State _state = State::Pending;
+    std::optional<ipc::CallResult> _result;
+};
+
+/// One push that a service sent to its peer.
+struct FakePush {
+    std::string signal;
+    ipc::Message message;
+};
+
+/// The server's end of a connection whose peer is the test. Like the real one it calls its handler on its queue, sends
+/// nothing after it was invalidated, and checks that what crosses it fits the interface: a mismatch fails the test.
+class FakeConnection final : public ipc::Connection {
+public:
+    FakeConnection(const ipc::Interface& interface, ipc::Peer peer, std::shared_ptr<Queue> queue);
+
+    // the peer's side
+    std::shared_ptr<FakeCall> call(std::string_view member, std::vector<Value> args = {});
+    std::shared_ptr<FakeCall> call(std::string_view member, ipc::Message arguments);
+    /// The peer goes away.
+    void end();
+    /// What was pushed so far, in order; it is taken out.
+    [[nodiscard]] std::vector<FakePush> takePushes();
+    [[nodiscard]] std::size_t pushCount() const;
+    /// Blocks until `count` pushes have come since the last `takePushes`.
+    void waitForPushes(std::size_t count);
+    [[nodiscard]] bool resumed() const;
+    /// True once either side has ended the connection.
+    [[nodiscard]] bool invalidated() const;
+
+    // the service's side
+    [[nodiscard]] ipc::Peer peer() const override { return _peer; }
+    [[nodiscard]] const std::shared_ptr<Queue>& queue() const override { return _queue; }
+    void exportObject(ipc::Handler handler) override;
+    void setInvalidationHandler(std::move_only_function<void()> handler) override;
+    void resume() override;
+    void push(std::string_view signal, ipc::Message arguments) override;
+    void invalidate() override;
+
+private:
+    void finish(bool dropQueuedCalls);
+
+    const ipc::Interface _interface;
+    const ipc::Peer _peer;
+    const std::shared_ptr<Queue> _queue;
+    mutable std::mutex _mutex;
+    std::condition_variable _pushed;
+    std::shared_ptr<ipc::Handler> _handler;
+    std::move_only_function<void()> _invalidationHandler;
+    std::vector<FakePush> _pushes;
+    const std::shared_ptr<std::atomic<bool>> _dropCalls = std::make_shared<std::atomic<bool>>(false);
+    bool _resumed = false;
+    bool _invalidated = false;
+};
+
+/// Listeners that exist in memory. A test connects to them by interface name, or by the address that it was handed.
+class FakeTransport final : public ipc::Transport {
+public:
+    FakeTransport(Executor& executor, Clock& clock) : _executor(executor), _clock(clock) {}
+
+    /// A connection to the newest living listener of that interface or address, already handed to its acceptor on this
+    /// thread; null where there is no such listener or it doesn't accept yet.
+    std::shared_ptr<FakeConnection> connect(std::string_view interfaceOrAddress, ipc::Peer peer = {1, 0});
+    /// Makes the next `listen` fail.
+    void failNextListen(Error error);
+
+    [[nodiscard]] Result<std::unique_ptr<ipc::Listener>> listen(const ipc::Interface& interface,
+                                                                const std::string& label) override;
+    [[nodiscard]] std::unique_ptr<ipc::Listener> anonymous(const ipc::Interface& interface,
+                                                           const std::string& label) override;
+
+private:
+    struct Endpoint;
+    class FakeListener;
+    std::unique_ptr<ipc::Listener> make(const ipc::Interface& interface, const std::string& label);
+
+    Executor& _executor;
+    Clock& _clock;
+    std::mutex _mutex;
+    std::vector<std::weak_ptr<Endpoint>> _endpoints;
+    std::optional<Error> _listenFailure;
+};
+
+/// Why `message` can't travel under a D-Bus signature; nothing if it can.
+[[nodiscard]] std::optional<std::string> shapeMismatch(std::string_view signature, const ipc::Message& message);
+
+} // namespace platform::test
