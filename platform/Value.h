@@ -2,6 +2,7 @@
 
 #include <cstdint>
 #include <expected>
+#include <initializer_list>
 #include <memory>
 #include <optional>
 #include <string>
@@ -55,7 +56,7 @@ public:
     Value(Dictionary dictionary);
     Value(const Value&) = default;
     Value(Value&& other) noexcept : _storage(std::exchange(other._storage, std::monostate{})) {}
-    Value& operator=(const Value&) = default;
+    Value& operator=(const Value& other);
     Value& operator=(Value&& other) noexcept;
     ~Value();
 
@@ -84,7 +85,12 @@ public:
     /// Without this, a literal would be taken for an index.
     [[nodiscard]] const Value& operator[](const char* key) const { return (*this)[std::string_view(key)]; }
     /// The element of an array; the null value where there is none.
-    [[nodiscard]] const Value& operator[](std::size_t index) const;
+    template <class I>
+        requires std::is_integral_v<I>
+    [[nodiscard]] const Value& operator[](I index) const
+    {
+        return element(static_cast<std::size_t>(index));
+    }
     /// Elements of an array or entries of a dictionary; 0 for anything else.
     [[nodiscard]] std::size_t count() const;
 
@@ -98,6 +104,8 @@ public:
     friend bool operator==(const Value& a, const Value& b);
 
 private:
+    [[nodiscard]] const Value& element(std::size_t index) const;
+
     template <class T> using Shared = std::shared_ptr<T>;
     std::variant<std::monostate, bool, std::int64_t, std::uint64_t, double, Shared<std::string>,
                  Shared<platform::Bytes>, platform::Date, Shared<Array>, Shared<Dictionary>>
@@ -124,7 +132,7 @@ public:
     [[nodiscard]] bool contains(std::string_view key) const { return find(key) != nullptr; }
     /// Sets the value of a key, keeping its place if it is there already.
     void set(std::string key, Value value);
-    /// True if the key was there.
+    /// True if the key was there. Costs as much as the dictionary is long.
     bool remove(std::string_view key);
     void reserve(std::size_t count);
 
@@ -137,6 +145,7 @@ public:
 
 private:
     struct Index;
+    [[nodiscard]] std::optional<std::size_t> positionOf(std::string_view key) const;
 
     std::vector<Entry> _entries;
     std::unique_ptr<Index> _index; // made when the dictionary grows past the linear limit
