@@ -1,0 +1,201 @@
+#include "platform/Files.h"
+
+#include <array>
+#include <cerrno>
+#include <cstdlib>
+#include <dirent.h>
+#include <fcntl.h>
+#include <pwd.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <fmt/format.h>
+
+#include "platform/Uuid.h"
+
+namespace platform {
+
+namespace fs = std::filesystem;
+
+FileHandle& FileHandle::operator=(FileHandle&& other) noexcept
+{
+    if (this != &other) {
+        if (_fd >= 0) close(_fd);
+        _fd = other.release();
+    }
+    return *this;
+}
+
+FileHandle::~FileHandle()
+{
+    if (_fd >= 0) close(_fd);
+}
+
+int FileHandle::release()
+{
+    return std::exchange(_fd, -1);
+}
+
+namespace {
+
+std::unexpected<Error> failure(const fs::path& path)
+{
+    return std::unexpected(Error::posix(errno, path.string()));
+}
+
+/// EINTR is no failure.
+template <class Call> auto retried(Call call)
+{
+    decltype(call()) result;
+    do result = call();
+    while (result < 0 && errno == EINTR);
+    return result;
+}
+
+Date dateOf(const statx_timestamp& time)
+{
+    return Date(std::chrono::seconds(time.tv_sec) + std::chrono::nanoseconds(time.tv_nsec));
+}
+
+bool writeAll(int fd, std::string_view contents)
+{
+    while (!contents.empty()) {
+        const ssize_t written = retried([&] { return write(fd, contents.data(), contents.size()); });
+        if (written < 0) return false;
+        contents.remove_prefix(static_cast<std::size_t>(written));
+    }
+    return true;
+}
+
+/// Makes what was renamed in a directory outlive a power cut.
+void syncDirectory(const fs::path& directory)
+{
+    FileHandle handle(open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    if (handle) fsync(handle.fd());
+}
+
+class SystemFiles final : public FileSystem {
+public:
+    Result<Bytes> read(const fs::path& path, std::size_t maximumSize) override
+    {
+        auto file = openForReading(path);
+        if (!file) return std::unexpected(std::move(file.error()));
+        std::string contents;
+        std::array<char, 64 * 1024> chunk;
+        while (true) {
+            const ssize_t count = retried([&] { return ::read(file->fd(), chunk.data(), chunk.size()); });
+            if (count < 0) return failure(path);
+            if (count == 0) return Bytes(std::move(contents));
+            contents.append(chunk.data(), static_cast<std::size_t>(count));
+            if (contents.size() > maximumSize) return std::unexpected(Error::posix(EFBIG, path.string()));
+        }
+    }
+
+    Result<void> writeAtomically(const fs::path& path, std::string_view contents) override
+    {
+        const fs::path temporary = path.string() + "." + Uuid::random().string().substr(0, 8) + ".tmp";
+        FileHandle file(retried([&] {
+            return open(temporary.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
+        }));
+        if (!file) return failure(path);
+        if (writeAll(file.fd(), contents) && fsync(file.fd()) == 0 && rename(temporary.c_str(), path.c_str()) == 0) {
+            syncDirectory(path.parent_path());
+            return {};
+        }
+        auto error = failure(path);
+        unlink(temporary.c_str());
+        return error;
+    }
+
+    Result<void> createDirectories(const fs::path& path) override
+    {
+        if (mkdir(path.c_str(), 0700) == 0) return {};
+        if (errno == ENOENT && path.has_relative_path()) {
+            if (auto parent = createDirectories(path.parent_path()); !parent) return parent;
+            if (mkdir(path.c_str(), 0700) == 0) return {};
+        }
+        if (errno != EEXIST) return failure(path);
+        struct stat status {};
+        if (stat(path.c_str(), &status) != 0) return failure(path);
+        if (!S_ISDIR(status.st_mode)) return std::unexpected(Error::posix(ENOTDIR, path.string()));
+        return {};
+    }
+
+    Result<FileInfo> info(const fs::path& path) override
+    {
+        struct statx status {};
+        if (statx(AT_FDCWD, path.c_str(), AT_SYMLINK_NOFOLLOW, STATX_BASIC_STATS | STATX_BTIME, &status) != 0)
+            return failure(path);
+        FileInfo info;
+        info.kind = S_ISREG(status.stx_mode)   ? FileInfo::Kind::File
+                    : S_ISDIR(status.stx_mode) ? FileInfo::Kind::Directory
+                                               : FileInfo::Kind::Other;
+        info.size = status.stx_size;
+        info.modified = dateOf(status.stx_mtime);
+        info.created = status.stx_mask & STATX_BTIME ? dateOf(status.stx_btime) : info.modified;
+        return info;
+    }
+
+    Result<void> remove(const fs::path& path) override
+    {
+        if (unlink(path.c_str()) != 0) return failure(path);
+        return {};
+    }
+
+    Result<std::vector<std::string>> list(const fs::path& path) override
+    {
+        const std::unique_ptr<DIR, int (*)(DIR*)> directory(opendir(path.c_str()), closedir);
+        if (!directory) return failure(path);
+        std::vector<std::string> names;
+        while (const dirent* entry = readdir(directory.get())) {
+            const std::string_view name = entry->d_name;
+            if (name != "." && name != "..") names.emplace_back(name);
+        }
+        return names;
+    }
+
+    Result<FileHandle> openForReading(const fs::path& path) override
+    {
+        // Non-blocking, or a pipe in the file's place would hold us until someone writes.
+        FileHandle file(retried([&] { return open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC); }));
+        struct stat status {};
+        if (!file || fstat(file.fd(), &status) != 0) return failure(path);
+        if (!S_ISREG(status.st_mode)) return std::unexpected(Error::posix(S_ISDIR(status.st_mode) ? EISDIR : EINVAL, path.string()));
+        return file;
+    }
+};
+
+fs::path fromEnvironmentOr(const char* variable, const fs::path& fallback)
+{
+    const char* value = std::getenv(variable);
+    return value && *value == '/' ? fs::path(value) : fallback; // relative paths are to be ignored
+}
+
+fs::path home()
+{
+    if (const char* value = std::getenv("HOME"); value && *value == '/') return value;
+    const passwd* entry = getpwuid(getuid());
+    return entry && entry->pw_dir ? entry->pw_dir : "/";
+}
+
+} // namespace
+
+std::unique_ptr<FileSystem> makeSystemFiles()
+{
+    return std::make_unique<SystemFiles>();
+}
+
+Directories Directories::fromEnvironment()
+{
+    Directories directories;
+    directories.caches = fromEnvironmentOr("XDG_CACHE_HOME", home() / ".cache");
+    directories.config = fromEnvironmentOr("XDG_CONFIG_HOME", home() / ".config");
+    directories.state = fromEnvironmentOr("XDG_STATE_HOME", home() / ".local/state");
+    directories.data = fromEnvironmentOr("XDG_DATA_HOME", home() / ".local/share");
+    directories.temporary = fromEnvironmentOr("TMPDIR", "/tmp");
+    directories.runtime =
+        fromEnvironmentOr("XDG_RUNTIME_DIR", directories.temporary / fmt::format("runtime-{}", getuid()));
+    return directories;
+}
+
+} // namespace platform
