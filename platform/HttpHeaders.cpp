@@ -1,0 +1,36 @@
+#include <algorithm>
+#include <strings.h>
+
+#include "platform/UrlSession.h"
+
+namespace platform {
+
+namespace {
+
+auto named(std::string_view name)
+{
+    return [name](const HttpHeaders::Entry& entry) {
+        return entry.first.size() == name.size() && strncasecmp(entry.first.data(), name.data(), name.size()) == 0;
+    };
+}
+
+} // namespace
+
+const std::string* HttpHeaders::find(std::string_view name) const
+{
+    const auto found = std::ranges::find_if(_entries, named(name));
+    return found == _entries.end() ? nullptr : &found->second;
+}
+
+void HttpHeaders::set(std::string name, std::string value)
+{
+    remove(name);
+    add(std::move(name), std::move(value));
+}
+
+void HttpHeaders::remove(std::string_view name)
+{
+    std::erase_if(_entries, named(name));
+}
+
+} // namespace platform
