@@ -1,0 +1,437 @@
+#include <algorithm>
+#include <arpa/inet.h>
+#include <atomic>
+#include <cmath>
+#include <cstring>
+#include <deque>
+#include <mutex>
+#include <thread>
+#include <vector>
+
+#include <curl/curl.h>
+#include <fmt/format.h>
+#include <openssl/ssl.h>
+
+#include "platform/CurlSupport.h"
+#include "platform/Queue.h"
+#include "platform/ThreadName.h"
+#include "platform/UrlSession.h"
+
+namespace platform {
+
+namespace {
+
+class CurlTask;
+
+/// The URL-loading thread. Everything with "loader thread" in its comment belongs to it alone.
+class Loader : public std::enable_shared_from_this<Loader> {
+public:
+    Loader() : _multi(curl_multi_init()) {}
+    ~Loader();
+
+    void start(std::shared_ptr<CurlTask> task);
+    void cancel(std::shared_ptr<CurlTask> task);
+    /// Ends every task and the thread.
+    void stop();
+
+private:
+    struct Command {
+        std::shared_ptr<CurlTask> task;
+        bool cancel;
+    };
+    void run();
+    void takeCommands();
+    void begin(const std::shared_ptr<CurlTask>& task);
+    void end(CURL* easy, CURLcode code, bool cancelled);
+    [[nodiscard]] CURL* takeEasy();
+    [[nodiscard]] int nextTimeout();
+
+    CURLM* _multi;
+    std::mutex _mutex;
+    std::vector<Command> _commands; // under the mutex
+    bool _stopping = false;         // under the mutex
+    std::thread _thread;            // made under the mutex
+    std::map<CURL*, std::shared_ptr<CurlTask>> _active; // loader thread
+    std::vector<CURL*> _spare;                          // loader thread
+};
+
+/// One load. The loader thread fills it in; the completion hands the results on.
+class CurlTask final : public UrlTask, public std::enable_shared_from_this<CurlTask> {
+public:
+    CurlTask(std::shared_ptr<Loader> loader, std::uint64_t identifier, UrlRequest request, UrlSessionConfiguration configuration,
+             UrlSession::DataCompletion completion, std::shared_ptr<Queue> delegateQueue)
+        : _loader(std::move(loader)), _identifier(identifier), _request(std::move(request)),
+          _configuration(std::move(configuration)), _completion(std::move(completion)),
+          _delegateQueue(std::move(delegateQueue))
+    {
+    }
+    ~CurlTask() override { curl_slist_free_all(_headerList); }
+
+    void resume() override
+    {
+        if (!_resumed.exchange(true)) _loader->start(shared_from_this());
+    }
+    void cancel() override
+    {
+        if (_resumed) _loader->cancel(shared_from_this());
+    }
+    [[nodiscard]] std::uint64_t identifier() const override { return _identifier; }
+    [[nodiscard]] const UrlRequest& originalRequest() const override { return _request; }
+    [[nodiscard]] Value timingData() const override
+    {
+        std::lock_guard lock(_timingMutex);
+        return _timing;
+    }
+
+    /// Sets the transfer up. Loader thread, like all below.
+    [[nodiscard]] bool configure(CURL* handle);
+    void complete(CURLcode code, bool cancelled);
+    [[nodiscard]] CURL* easy() const { return _easy; }
+
+    /// Milliseconds until the task times out for having received nothing; none while it isn't sent.
+    [[nodiscard]] std::chrono::milliseconds timeLeft(std::chrono::steady_clock::time_point now) const
+    {
+        return std::chrono::ceil<std::chrono::milliseconds>(_lastProgress + timeout() - now);
+    }
+    bool timedOut = false;
+
+private:
+    [[nodiscard]] Duration timeout() const { return _request.timeout.value_or(_configuration.requestTimeout); }
+    void progressed() { _lastProgress = std::chrono::steady_clock::now(); }
+    std::size_t received(std::string_view bytes);
+    std::size_t receivedHeader(std::string_view line);
+    int mayConnect(const char* address);
+
+    std::shared_ptr<Loader> _loader;
+    const std::uint64_t _identifier;
+    const UrlRequest _request;
+    const UrlSessionConfiguration _configuration;
+    UrlSession::DataCompletion _completion;
+    std::shared_ptr<Queue> _delegateQueue;
+    std::atomic<bool> _resumed = false;
+
+    CURL* _easy = nullptr;
+    curl_slist* _headerList = nullptr;
+    std::chrono::steady_clock::time_point _lastProgress;
+    double _start = 0; // on the monotonic clock
+    std::string _body;
+    HttpHeaders _headers;
+    bool _tooLarge = false;
+    std::optional<bool> _firstHopPublic;
+    bool _forbiddenHop = false;
+    std::array<char, CURL_ERROR_SIZE> _errorText{};
+
+    mutable std::mutex _timingMutex;
+    Value _timing; // under the mutex
+};
+
+std::size_t CurlTask::received(std::string_view bytes)
+{
+    progressed();
+    if (_body.empty()) {
+        curl_off_t length = -1;
+        curl_easy_getinfo(_easy, CURLINFO_CONTENT_LENGTH_DOWNLOAD_T, &length);
+        if (length > 0) _body.reserve(std::min<std::size_t>(static_cast<std::size_t>(length), _configuration.maximumResponseSize));
+    }
+    if (_body.size() + bytes.size() > _configuration.maximumResponseSize) {
+        _tooLarge = true;
+        return 0;
+    }
+    _body.append(bytes);
+    return bytes.size();
+}
+
+std::size_t CurlTask::receivedHeader(std::string_view line)
+{
+    progressed();
+    if (line.starts_with("HTTP/")) {
+        _headers = {}; // of a redirect, or of an interim answer
+        _body.clear();
+        return line.size();
+    }
+    const std::size_t colon = line.find(':');
+    if (colon == std::string_view::npos) return line.size();
+    std::string_view value = line.substr(colon + 1);
+    const auto isBlank = [](char c) { return c == ' ' || c == '\t' || c == '\r' || c == '\n'; };
+    while (!value.empty() && isBlank(value.front())) value.remove_prefix(1);
+    while (!value.empty() && isBlank(value.back())) value.remove_suffix(1);
+    _headers.add(std::string(line.substr(0, colon)), std::string(value));
+    return line.size();
+}
+
+/// A public host must not lead us, by a redirect, to an address of the inner network.
+int CurlTask::mayConnect(const char* address)
+{
+    const bool isPublic = isPublicAddress(address);
+    if (!_firstHopPublic) _firstHopPublic = isPublic;
+    _forbiddenHop = *_firstHopPublic && !isPublic;
+    return _forbiddenHop ? CURL_PREREQFUNC_ABORT : CURL_PREREQFUNC_OK;
+}
+
+bool CurlTask::configure(CURL* handle)
+{
+    _easy = handle;
+    _start = monotonicSeconds();
+    progressed();
+    const auto set = [handle](CURLoption option, auto value) { return curl_easy_setopt(handle, option, value) == CURLE_OK; };
+
+    set(CURLOPT_ERRORBUFFER, _errorText.data());
+    set(CURLOPT_NOSIGNAL, 1L);
+    set(CURLOPT_PROTOCOLS_STR, "http,https");
+    set(CURLOPT_REDIR_PROTOCOLS_STR, "http,https");
+    set(CURLOPT_FOLLOWLOCATION, 1L);
+    set(CURLOPT_MAXREDIRS, static_cast<long>(_configuration.maximumRedirects));
+    set(CURLOPT_HTTP_VERSION, static_cast<long>(CURL_HTTP_VERSION_2TLS));
+    set(CURLOPT_PIPEWAIT, _configuration.pipelining ? 1L : 0L);
+    set(CURLOPT_TCP_FASTOPEN, _configuration.allowFastOpenAndTickets ? 1L : 0L);
+    set(CURLOPT_SSL_SESSIONID_CACHE, _configuration.allowFastOpenAndTickets ? 1L : 0L);
+    set(CURLOPT_ACCEPT_ENCODING, "");
+    if (_configuration.connectionPurgeTimeout)
+        set(CURLOPT_MAXAGE_CONN, static_cast<long>(toSeconds(*_configuration.connectionPurgeTimeout)));
+    if (!_configuration.caFile.empty()) set(CURLOPT_CAINFO, _configuration.caFile.c_str());
+    if (_configuration.allowFastOpenAndTickets) {
+        // libcurl switches session tickets off; they save a round trip on every new connection.
+        set(CURLOPT_SSL_CTX_FUNCTION, +[](CURL*, void* context, void*) -> CURLcode {
+            SSL_CTX_clear_options(static_cast<SSL_CTX*>(context), SSL_OP_NO_TICKET);
+            return CURLE_OK;
+        });
+    }
+    set(CURLOPT_WRITEDATA, this);
+    set(CURLOPT_WRITEFUNCTION, +[](char* data, std::size_t, std::size_t count, void* self) {
+        return static_cast<CurlTask*>(self)->received({data, count});
+    });
+    set(CURLOPT_HEADERDATA, this);
+    set(CURLOPT_HEADERFUNCTION, +[](char* data, std::size_t, std::size_t count, void* self) {
+        return static_cast<CurlTask*>(self)->receivedHeader({data, count});
+    });
+    set(CURLOPT_PREREQDATA, this);
+    set(CURLOPT_PREREQFUNCTION, +[](void* self, char* address, char*, int, int) {
+        return static_cast<CurlTask*>(self)->mayConnect(address);
+    });
+
+    for (const auto& [name, value] : _request.headers) {
+        // "Name;" is how libcurl is told to send an empty field.
+        const std::string line = value.empty() ? name + ";" : name + ": " + value;
+        if (line.find_first_of("\r\n") != std::string::npos) continue;
+        curl_slist* extended = curl_slist_append(_headerList, line.c_str());
+        if (extended) _headerList = extended;
+    }
+    if (_request.method != "GET") set(CURLOPT_CUSTOMREQUEST, _request.method.c_str());
+    if (!_request.body.empty() || _request.method == "POST") {
+        set(CURLOPT_POST, 1L);
+        set(CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(_request.body.size()));
+        set(CURLOPT_POSTFIELDS, _request.body.empty() ? "" : _request.body.data());
+        curl_slist* extended = curl_slist_append(_headerList, "Expect:");
+        if (extended) _headerList = extended;
+    }
+    set(CURLOPT_HTTPHEADER, _headerList);
+    return set(CURLOPT_URL, _request.url.string().c_str());
+}
+
+void CurlTask::complete(CURLcode code, bool cancelled)
+{
+    std::optional<UrlResponse> response;
+    std::optional<Bytes> data;
+    std::optional<Error> error;
+
+    if (cancelled) error = urlError(kUrlCancelled, "cancelled");
+    else if (timedOut) error = urlError(kUrlTimedOut, fmt::format("nothing received for {:g} s", toSeconds(timeout())));
+    else if (_tooLarge) error = urlError(kUrlTooLarge, fmt::format("more than {} bytes", _configuration.maximumResponseSize));
+    else if (_forbiddenHop) error = urlError(kUrlForbiddenRedirect, "redirected to a private address");
+    else if (code != CURLE_OK) error = urlErrorFromCurl(code, _errorText.data());
+
+    if (_easy && !cancelled) {
+        long status = 0;
+        char* url = nullptr;
+        curl_easy_getinfo(_easy, CURLINFO_RESPONSE_CODE, &status);
+        curl_easy_getinfo(_easy, CURLINFO_EFFECTIVE_URL, &url);
+        if (status > 0) {
+            response = UrlResponse{.url = url ? Url::parse(url).value_or(_request.url) : _request.url,
+                                   .isHttp = true,
+                                   .statusCode = static_cast<int>(status),
+                                   .headers = std::move(_headers)};
+        }
+        std::lock_guard lock(_timingMutex);
+        _timing = timingDataOf(_easy, _start);
+    }
+    if (!error) data = Bytes(std::move(_body));
+    _easy = nullptr;
+    _delegateQueue->async([self = shared_from_this(), data = std::move(data), response = std::move(response),
+                           error = std::move(error)]() mutable {
+        // Moved out first: the completion may be what keeps the task's owner alive.
+        auto completion = std::exchange(self->_completion, {});
+        completion(std::move(data), std::move(response), std::move(error));
+    });
+}
+
+Loader::~Loader()
+{
+    stop();
+    curl_multi_cleanup(_multi);
+}
+
+void Loader::start(std::shared_ptr<CurlTask> task)
+{
+    {
+        std::lock_guard lock(_mutex);
+        if (!_stopping) {
+            _commands.push_back({std::move(task), false});
+            if (!_thread.joinable()) _thread = std::thread([this] { run(); });
+        }
+    }
+    if (task) return task->complete(CURLE_OK, true);
+    curl_multi_wakeup(_multi);
+}
+
+void Loader::cancel(std::shared_ptr<CurlTask> task)
+{
+    {
+        std::lock_guard lock(_mutex);
+        if (_stopping) return;
+        _commands.push_back({std::move(task), true});
+    }
+    curl_multi_wakeup(_multi);
+}
+
+void Loader::stop()
+{
+    {
+        std::lock_guard lock(_mutex);
+        _stopping = true;
+        if (!_thread.joinable()) return;
+    }
+    curl_multi_wakeup(_multi);
+    _thread.join();
+}
+
+CURL* Loader::takeEasy()
+{
+    if (_spare.empty()) return curl_easy_init();
+    CURL* easy = _spare.back();
+    _spare.pop_back();
+    return easy;
+}
+
+void Loader::takeCommands()
+{
+    std::vector<Command> commands;
+    {
+        std::lock_guard lock(_mutex);
+        commands.swap(_commands);
+    }
+    for (Command& command : commands) {
+        if (!command.cancel) begin(command.task);
+        else if (command.task->easy()) end(command.task->easy(), CURLE_OK, true);
+    }
+}
+
+void Loader::begin(const std::shared_ptr<CurlTask>& task)
+{
+    CURL* easy = takeEasy();
+    if (!easy || !task->configure(easy) || curl_multi_add_handle(_multi, easy) != CURLM_OK) {
+        task->complete(CURLE_FAILED_INIT, false);
+        if (easy) curl_easy_cleanup(easy);
+        return;
+    }
+    _active.emplace(easy, task);
+}
+
+void Loader::end(CURL* easy, CURLcode code, bool cancelled)
+{
+    const auto found = _active.find(easy);
+    if (found == _active.end()) return;
+    const std::shared_ptr<CurlTask> task = std::move(found->second);
+    _active.erase(found);
+    task->complete(code, cancelled);
+    curl_multi_remove_handle(_multi, easy);
+    constexpr std::size_t kSpareHandles = 8;
+    if (_spare.size() < kSpareHandles) {
+        curl_easy_reset(easy);
+        _spare.push_back(easy);
+    } else {
+        curl_easy_cleanup(easy);
+    }
+}
+
+/// Ends what has received nothing for too long, and answers how long to wait for the next such moment.
+int Loader::nextTimeout()
+{
+    const auto now = std::chrono::steady_clock::now();
+    std::vector<CURL*> late;
+    std::chrono::milliseconds shortest(std::chrono::hours(1));
+    for (const auto& [easy, task] : _active) {
+        const auto left = task->timeLeft(now);
+        if (left.count() <= 0) late.push_back(easy);
+        else shortest = std::min(shortest, left);
+    }
+    for (CURL* easy : late) {
+        _active.at(easy)->timedOut = true;
+        end(easy, CURLE_OPERATION_TIMEDOUT, false);
+    }
+    // Without a task there is nothing to wake for: start and cancel interrupt the wait.
+    return _active.empty() ? std::numeric_limits<int>::max() : static_cast<int>(shortest.count());
+}
+
+void Loader::run()
+{
+    setThreadNameForLabel("url-loader");
+    while (true) {
+        {
+            std::lock_guard lock(_mutex);
+            if (_stopping) break;
+        }
+        takeCommands();
+        int running = 0;
+        curl_multi_perform(_multi, &running);
+        int left = 0;
+        while (const CURLMsg* message = curl_multi_info_read(_multi, &left))
+            if (message->msg == CURLMSG_DONE) end(message->easy_handle, message->data.result, false);
+        curl_multi_poll(_multi, nullptr, 0, nextTimeout(), nullptr);
+    }
+    takeCommands();
+    while (!_active.empty()) end(_active.begin()->first, CURLE_OK, true);
+    for (CURL* easy : _spare) curl_easy_cleanup(easy);
+    _spare.clear();
+}
+
+class CurlSession final : public UrlSession {
+public:
+    CurlSession(std::shared_ptr<Loader> loader, UrlSessionConfiguration configuration, std::shared_ptr<Queue> queue)
+        : _loader(std::move(loader)), _configuration(std::move(configuration)), _queue(std::move(queue))
+    {
+    }
+    std::shared_ptr<UrlTask> dataTask(UrlRequest request, DataCompletion completion) override
+    {
+        return std::make_shared<CurlTask>(_loader, ++_lastIdentifier, std::move(request), _configuration, std::move(completion),
+                                          _queue);
+    }
+
+private:
+    std::shared_ptr<Loader> _loader;
+    const UrlSessionConfiguration _configuration;
+    std::shared_ptr<Queue> _queue;
+    std::atomic<std::uint64_t> _lastIdentifier = 0;
+};
+
+class CurlLoader final : public UrlLoader {
+public:
+    ~CurlLoader() override { _loader->stop(); }
+    std::shared_ptr<UrlSession> makeSession(UrlSessionConfiguration configuration, std::shared_ptr<Queue> delegateQueue) override
+    {
+        return std::make_shared<CurlSession>(_loader, std::move(configuration), std::move(delegateQueue));
+    }
+
+private:
+    std::shared_ptr<Loader> _loader = std::make_shared<Loader>();
+};
+
+} // namespace
+
+std::unique_ptr<UrlLoader> makeCurlLoader()
+{
+    static std::once_flag once;
+    std::call_once(once, [] { curl_global_init(CURL_GLOBAL_DEFAULT); });
+    return std::make_unique<CurlLoader>();
+}
+
+} // namespace platform

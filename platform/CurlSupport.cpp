@@ -1,0 +1,166 @@
+#include "platform/CurlSupport.h"
+
+#include <algorithm>
+#include <arpa/inet.h>
+#include <array>
+#include <chrono>
+#include <cstring>
+#include <ifaddrs.h>
+#include <memory>
+#include <netinet/in.h>
+
+#include "platform/UrlSession.h"
+
+namespace platform {
+
+Error urlError(std::int64_t code, std::string reason)
+{
+    return Error::withReason(std::string(kUrlErrorDomain), code, std::move(reason));
+}
+
+Error urlErrorFromCurl(CURLcode code, const char* detail)
+{
+    const auto mapped = [code]() -> std::int64_t {
+        switch (code) {
+        case CURLE_URL_MALFORMAT: return kUrlBadUrl;
+        case CURLE_UNSUPPORTED_PROTOCOL: return kUrlUnsupported;
+        case CURLE_COULDNT_RESOLVE_HOST:
+        case CURLE_COULDNT_RESOLVE_PROXY: return kUrlCannotFindHost;
+        case CURLE_COULDNT_CONNECT: return kUrlCannotConnect;
+        case CURLE_OPERATION_TIMEDOUT: return kUrlTimedOut;
+        case CURLE_TOO_MANY_REDIRECTS: return kUrlTooManyRedirects;
+        case CURLE_SSL_CONNECT_ERROR:
+        case CURLE_PEER_FAILED_VERIFICATION:
+        case CURLE_SSL_CERTPROBLEM:
+        case CURLE_SSL_CIPHER:
+        case CURLE_SSL_CACERT_BADFILE:
+        case CURLE_SSL_ISSUER_ERROR: return kUrlTlsFailed;
+        case CURLE_FILESIZE_EXCEEDED: return kUrlTooLarge;
+        case CURLE_WEIRD_SERVER_REPLY:
+        case CURLE_BAD_CONTENT_ENCODING:
+        case CURLE_HTTP2:
+        case CURLE_HTTP2_STREAM: return kUrlBadResponse;
+        default: return kUrlConnectionLost;
+        }
+    };
+    std::string reason = curl_easy_strerror(code);
+    if (detail && *detail) reason += std::string(": ") + detail;
+    return urlError(mapped(), std::move(reason));
+}
+
+bool isPublicAddress(const std::string& address)
+{
+    in_addr v4{};
+    in6_addr v6{};
+    if (inet_pton(AF_INET6, address.c_str(), &v6) == 1) {
+        if (!IN6_IS_ADDR_V4MAPPED(&v6)) {
+            const bool uniqueLocal = (v6.s6_addr[0] & 0xfe) == 0xfc;
+            return !(IN6_IS_ADDR_LOOPBACK(&v6) || IN6_IS_ADDR_UNSPECIFIED(&v6) || IN6_IS_ADDR_LINKLOCAL(&v6) || uniqueLocal);
+        }
+        std::memcpy(&v4, v6.s6_addr + 12, sizeof v4);
+    } else if (inet_pton(AF_INET, address.c_str(), &v4) != 1) {
+        return false;
+    }
+    const std::uint32_t a = ntohl(v4.s_addr);
+    const auto within = [a](std::uint32_t network, int bits) { return (a ^ network) >> (32 - bits) == 0; };
+    return !(within(0x7f000000, 8) || within(0x0a000000, 8) || within(0xac100000, 12) || within(0xc0a80000, 16) ||
+             within(0xa9fe0000, 16) || within(0x64400000, 10) || within(0x00000000, 8));
+}
+
+double monotonicSeconds()
+{
+    return std::chrono::duration<double>(std::chrono::steady_clock::now().time_since_epoch()).count();
+}
+
+namespace {
+
+/// The peer as a socket address: length, family (2 or 30), port, and the address from byte 4 (IPv4) or 8 (IPv6).
+std::string peerAddress(const std::string& ip, long port)
+{
+    const auto put = [&](std::string& address, std::size_t length, char family) {
+        address.assign(length, '\0');
+        address[0] = static_cast<char>(length);
+        address[1] = family;
+        address[2] = static_cast<char>(port >> 8);
+        address[3] = static_cast<char>(port & 0xff);
+    };
+    std::string address;
+    in_addr v4{};
+    in6_addr v6{};
+    if (inet_pton(AF_INET, ip.c_str(), &v4) == 1) {
+        put(address, 16, 2);
+        std::memcpy(address.data() + 4, &v4, sizeof v4);
+    } else if (inet_pton(AF_INET6, ip.c_str(), &v6) == 1) {
+        put(address, 28, 30);
+        std::memcpy(address.data() + 8, &v6, sizeof v6);
+    }
+    return address;
+}
+
+/// The name of the interface that has this address.
+std::string interfaceOf(const std::string& localIp)
+{
+    ifaddrs* list = nullptr;
+    if (getifaddrs(&list) != 0) return {};
+    const std::unique_ptr<ifaddrs, decltype(&freeifaddrs)> owner(list, freeifaddrs);
+    for (const ifaddrs* entry = list; entry; entry = entry->ifa_next) {
+        if (!entry->ifa_addr) continue;
+        std::array<char, INET6_ADDRSTRLEN> text{};
+        const int family = entry->ifa_addr->sa_family;
+        const void* address = nullptr;
+        if (family == AF_INET) address = &reinterpret_cast<const sockaddr_in*>(entry->ifa_addr)->sin_addr;
+        else if (family == AF_INET6) address = &reinterpret_cast<const sockaddr_in6*>(entry->ifa_addr)->sin6_addr;
+        if (address && inet_ntop(family, address, text.data(), text.size()) && localIp == text.data()) return entry->ifa_name;
+    }
+    return {};
+}
+
+} // namespace
+
+Value timingDataOf(CURL* easy, double start)
+{
+    // Marks count from the start of the last hop; a stage that wasn't needed is as old as the one before.
+    const auto mark = [&](CURLINFO info) {
+        curl_off_t microseconds = 0;
+        curl_easy_getinfo(easy, info, &microseconds);
+        return static_cast<double>(microseconds) / 1e6;
+    };
+    const auto text = [&](CURLINFO info) {
+        char* value = nullptr;
+        curl_easy_getinfo(easy, info, &value);
+        return std::string(value ? value : "");
+    };
+    const double redirects = mark(CURLINFO_REDIRECT_TIME_T);
+    const double lookup = mark(CURLINFO_NAMELOOKUP_TIME_T);
+    const double connected = mark(CURLINFO_CONNECT_TIME_T);
+    const double secured = mark(CURLINFO_APPCONNECT_TIME_T);
+    const double ready = mark(CURLINFO_PRETRANSFER_TIME_T);
+    const double firstByte = mark(CURLINFO_STARTTRANSFER_TIME_T);
+    const double total = mark(CURLINFO_TOTAL_TIME_T);
+    long newConnections = 0;
+    long port = 0;
+    curl_easy_getinfo(easy, CURLINFO_NUM_CONNECTS, &newConnections);
+    curl_easy_getinfo(easy, CURLINFO_PRIMARY_PORT, &port);
+    const bool reused = newConnections == 0;
+
+    const auto at = [&](double offset, bool happened = true) { return happened && offset > 0 ? start + offset : 0.0; };
+    Dictionary timing{{"_kCFNTimingDataFetchStart", start},
+                      {"_kCFNTimingDataRedirectStart", redirects > 0 ? start : 0.0},
+                      {"_kCFNTimingDataRedirectEnd", at(redirects)},
+                      {"_kCFNTimingDataDomainLookupStart", reused ? 0.0 : start + redirects},
+                      {"_kCFNTimingDataDomainLookupEnd", at(lookup, !reused)},
+                      {"_kCFNTimingDataConnectStart", at(lookup, !reused)},
+                      {"_kCFNTimingDataConnectEnd", at(std::max(connected, secured), !reused)},
+                      {"_kCFNTimingDataSecureConnectionStart", at(connected, !reused && secured > 0)},
+                      {"_kCFNTimingDataRequestStart", at(ready)},
+                      {"_kCFNTimingDataResponseStart", at(firstByte)},
+                      {"_kCFNTimingDataResponseEnd", at(total)},
+                      {"_kCFNTimingDataConnectionReused", reused}};
+    if (std::string name = interfaceOf(text(CURLINFO_LOCAL_IP)); !name.empty())
+        timing.set("_kCFNTimingDataConnectionInterfaceIdentifier", std::move(name));
+    if (std::string address = peerAddress(text(CURLINFO_PRIMARY_IP), port); !address.empty())
+        timing.set("_kCFNTimingDataConnectionPeerAddress", Bytes(std::move(address)));
+    return timing;
+}
+
+} // namespace platform

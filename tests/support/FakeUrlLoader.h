@@ -1,0 +1,82 @@
+#pragma once
+
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "platform/Queue.h"
+#include "platform/UrlSession.h"
+
+namespace platform {
+
+/// A loader that a test answers by hand.
+class FakeUrlLoader final : public UrlLoader {
+public:
+    class Task final : public UrlTask, public std::enable_shared_from_this<Task> {
+    public:
+        Task(std::uint64_t identifier, UrlRequest request, UrlSession::DataCompletion completion, std::shared_ptr<Queue> queue)
+            : _identifier(identifier), _request(std::move(request)), _completion(std::move(completion)),
+              _queue(std::move(queue))
+        {
+        }
+        void resume() override { resumed = true; }
+        void cancel() override { fail(Error::withReason(std::string(kUrlErrorDomain), kUrlCancelled, "cancelled")); }
+        [[nodiscard]] std::uint64_t identifier() const override { return _identifier; }
+        [[nodiscard]] const UrlRequest& originalRequest() const override { return _request; }
+        [[nodiscard]] Value timingData() const override { return timing; }
+
+        void respond(int status, std::string body, HttpHeaders headers = {})
+        {
+            finish(Bytes(std::move(body)), UrlResponse{_request.url, true, status, std::move(headers)}, std::nullopt);
+        }
+        void fail(Error error) { finish(std::nullopt, std::nullopt, std::move(error)); }
+        void finish(std::optional<Bytes> data, std::optional<UrlResponse> response, std::optional<Error> error)
+        {
+            if (finished) return;
+            finished = true;
+            _queue->async([self = shared_from_this(), data = std::move(data), response = std::move(response),
+                           error = std::move(error)]() mutable {
+                std::exchange(self->_completion, {})(std::move(data), std::move(response), std::move(error));
+            });
+        }
+
+        bool resumed = false;
+        bool finished = false;
+        Value timing;
+
+    private:
+        std::uint64_t _identifier;
+        UrlRequest _request;
+        UrlSession::DataCompletion _completion;
+        std::shared_ptr<Queue> _queue;
+    };
+
+    class Session final : public UrlSession {
+    public:
+        Session(UrlSessionConfiguration configuration_, std::shared_ptr<Queue> queue)
+            : configuration(std::move(configuration_)), _queue(std::move(queue))
+        {
+        }
+        std::shared_ptr<UrlTask> dataTask(UrlRequest request, DataCompletion completion) override
+        {
+            tasks.push_back(std::make_shared<Task>(tasks.size() + 1, std::move(request), std::move(completion), _queue));
+            return tasks.back();
+        }
+        UrlSessionConfiguration configuration;
+        std::vector<std::shared_ptr<Task>> tasks;
+
+    private:
+        std::shared_ptr<Queue> _queue;
+    };
+
+    std::shared_ptr<UrlSession> makeSession(UrlSessionConfiguration configuration, std::shared_ptr<Queue> queue) override
+    {
+        sessions.push_back(std::make_shared<Session>(std::move(configuration), std::move(queue)));
+        return sessions.back();
+    }
+
+    /// In the order in which they were made.
+    std::vector<std::shared_ptr<Session>> sessions;
+};
+
+} // namespace platform
