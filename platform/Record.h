@@ -32,7 +32,8 @@
 /// Value, Error, a shared_ptr to a record, or an optional or vector of these.
 ///
 /// Decoding is class-checked: a value of the wrong type, an unknown class or a record of another class than the
-/// field's is an error that names the field. Unknown keys are skipped; missing keys leave the field as it was made.
+/// field's is an error that names the field, and so is a null in an array of records. Unknown keys are skipped; missing
+/// keys leave the field as it was made.
 namespace platform {
 
 /// Takes one record apart, value by value, in the order in which the record lists its fields.
@@ -222,7 +223,12 @@ template <class T> void decodeValue(Decoder& decoder, T& value)
     } else if constexpr (IsVector<T>::value) {
         value.clear();
         value.reserve(decoder.beginArray());
-        while (decoder.nextElement()) decodeValue(decoder, value.emplace_back());
+        while (decoder.nextElement()) {
+            decodeValue(decoder, value.emplace_back());
+            if constexpr (IsShared<typename T::value_type>::value) {
+                if (!value.back()) decoder.fail("missing record");
+            }
+        }
     } else { // Url
         auto url = T::parse(decoder.string());
         if (url) value = std::move(*url);
@@ -235,6 +241,8 @@ template <class T> void decodeValue(Decoder& decoder, T& value)
 /// Base of a record `Self` that extends the record `Base`; see the top of this file.
 template <class Self, class Base = Record> class RecordOf : public Base {
 public:
+    using Base::Base;
+
     [[nodiscard]] std::string_view className() const override { return Self::kClass; }
 
     [[nodiscard]] std::size_t fieldCount() const override
