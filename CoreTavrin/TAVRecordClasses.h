@@ -1,0 +1,10 @@
+#pragma once
+
+#include "platform/Record.h"
+
+namespace tavrin {
+
+/// Every record that may cross IPC: the search records and those of this layer. Any thread.
+[[nodiscard]] const platform::RecordClasses& coreRecordClasses();
+
+} // namespace tavrin
