@@ -86,20 +86,24 @@ struct CounterStore::Impl : std::enable_shared_from_this<Impl> {
     {
         auto bytes = files->read(path, kMaximumSize);
         if (!bytes) {
-            if (bytes.error().code != ENOENT) defaultLog().error("counters can't be read: {}", bytes.error().description());
+            if (bytes.error().code != ENOENT)
+                defaultLog().error("counters can't be read: {}", bytes.error().description());
             return;
         }
         const auto contents = parseJson(bytes->view(), kMaximumSize);
-        if (!contents || !contents->asDictionary()) return defaultLog().error("counters {} are broken, starting at 0", path.string());
+        if (!contents || !contents->asDictionary())
+            return defaultLog().error("counters {} are broken, starting at 0", path.string());
         std::unique_lock lock(mutex);
         for (const auto& [key, count] : *contents->asDictionary())
-            if (const auto number = count.asInt(); number && counters.size() < kMaximumCounters) counters.try_emplace(key, *number);
+            if (const auto number = count.asInt(); number && counters.size() < kMaximumCounters)
+                counters.try_emplace(key, *number);
     }
 };
 
 CounterStore::CounterStore() : _impl(std::make_shared<Impl>()) {}
 
-CounterStore::CounterStore(FileSystem& files, std::filesystem::path path, std::shared_ptr<Queue> writeQueue) : CounterStore()
+CounterStore::CounterStore(FileSystem& files, std::filesystem::path path, std::shared_ptr<Queue> writeQueue)
+    : CounterStore()
 {
     _impl->files = &files;
     _impl->path = std::move(path);
@@ -148,9 +152,12 @@ std::string CounterStore::openMetrics() const
     for (const auto& [key, count] : snapshot()) {
         std::string label;
         for (const char c : key) {
-            if (c == '\n') label += "\\n";
-            else if (c == '"' || c == '\\') label += {'\\', c};
-            else label += c;
+            if (c == '\n')
+                label += "\\n";
+            else if (c == '"' || c == '\\')
+                label += {'\\', c};
+            else
+                label += c;
         }
         text += fmt::format("tavrind_counter{{key=\"{}\"}} {}\n", label, count);
     }

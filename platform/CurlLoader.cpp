@@ -48,9 +48,9 @@ private:
 
     CURLM* _multi;
     std::mutex _mutex;
-    std::vector<Command> _commands; // under the mutex
-    bool _stopping = false;         // under the mutex
-    std::thread _thread;            // made under the mutex
+    std::vector<Command> _commands;                     // under the mutex
+    bool _stopping = false;                             // under the mutex
+    std::thread _thread;                                // made under the mutex
     std::map<CURL*, std::shared_ptr<CurlTask>> _active; // loader thread
     std::vector<CURL*> _spare;                          // loader thread
 };
@@ -58,13 +58,13 @@ private:
 /// One load. The loader thread fills it in; the completion hands the results on.
 class CurlTask final : public UrlTask, public std::enable_shared_from_this<CurlTask> {
 public:
-    CurlTask(std::shared_ptr<Loader> loader, std::uint64_t identifier, UrlRequest request, UrlSessionConfiguration configuration,
-             UrlSession::DataCompletion completion, std::shared_ptr<Queue> delegateQueue)
+    CurlTask(std::shared_ptr<Loader> loader, std::uint64_t identifier, UrlRequest request,
+             UrlSessionConfiguration configuration, UrlSession::DataCompletion completion,
+             std::shared_ptr<Queue> delegateQueue)
         : _loader(std::move(loader)), _identifier(identifier), _request(std::move(request)),
           _configuration(std::move(configuration)), _completion(std::move(completion)),
           _delegateQueue(std::move(delegateQueue))
-    {
-    }
+    {}
     ~CurlTask() override { curl_slist_free_all(_headerList); }
 
     void resume() override
@@ -131,7 +131,8 @@ std::size_t CurlTask::received(std::string_view bytes)
     if (_body.empty()) {
         curl_off_t length = -1;
         curl_easy_getinfo(_easy, CURLINFO_CONTENT_LENGTH_DOWNLOAD_T, &length);
-        if (length > 0) _body.reserve(std::min<std::size_t>(static_cast<std::size_t>(length), _configuration.maximumResponseSize));
+        if (length > 0)
+            _body.reserve(std::min<std::size_t>(static_cast<std::size_t>(length), _configuration.maximumResponseSize));
     }
     if (_body.size() + bytes.size() > _configuration.maximumResponseSize) {
         _tooLarge = true;
@@ -173,7 +174,9 @@ bool CurlTask::configure(CURL* handle)
     _easy = handle;
     _start = monotonicSeconds();
     progressed();
-    const auto set = [handle](CURLoption option, auto value) { return curl_easy_setopt(handle, option, value) == CURLE_OK; };
+    const auto set = [handle](CURLoption option, auto value) {
+        return curl_easy_setopt(handle, option, value) == CURLE_OK;
+    };
 
     set(CURLOPT_ERRORBUFFER, _errorText.data());
     set(CURLOPT_NOSIGNAL, 1L);
@@ -191,23 +194,26 @@ bool CurlTask::configure(CURL* handle)
     if (!_configuration.caFile.empty()) set(CURLOPT_CAINFO, _configuration.caFile.c_str());
     if (_configuration.allowFastOpenAndTickets) {
         // libcurl switches session tickets off; they save a round trip on every new connection.
-        set(CURLOPT_SSL_CTX_FUNCTION, +[](CURL*, void* context, void*) -> CURLcode {
-            SSL_CTX_clear_options(static_cast<SSL_CTX*>(context), SSL_OP_NO_TICKET);
-            return CURLE_OK;
-        });
+        set(
+            CURLOPT_SSL_CTX_FUNCTION, +[](CURL*, void* context, void*) -> CURLcode {
+                SSL_CTX_clear_options(static_cast<SSL_CTX*>(context), SSL_OP_NO_TICKET);
+                return CURLE_OK;
+            });
     }
     set(CURLOPT_WRITEDATA, this);
-    set(CURLOPT_WRITEFUNCTION, +[](char* data, std::size_t, std::size_t count, void* self) {
-        return static_cast<CurlTask*>(self)->received({data, count});
-    });
+    set(
+        CURLOPT_WRITEFUNCTION, +[](char* data, std::size_t, std::size_t count, void* self) {
+            return static_cast<CurlTask*>(self)->received({data, count});
+        });
     set(CURLOPT_HEADERDATA, this);
-    set(CURLOPT_HEADERFUNCTION, +[](char* data, std::size_t, std::size_t count, void* self) {
-        return static_cast<CurlTask*>(self)->receivedHeader({data, count});
-    });
+    set(
+        CURLOPT_HEADERFUNCTION, +[](char* data, std::size_t, std::size_t count, void* self) {
+            return static_cast<CurlTask*>(self)->receivedHeader({data, count});
+        });
     set(CURLOPT_PREREQDATA, this);
-    set(CURLOPT_PREREQFUNCTION, +[](void* self, char* address, char*, int, int) {
-        return static_cast<CurlTask*>(self)->mayConnect(address);
-    });
+    set(
+        CURLOPT_PREREQFUNCTION,
+        +[](void* self, char* address, char*, int, int) { return static_cast<CurlTask*>(self)->mayConnect(address); });
 
     for (const auto& [name, value] : _request.headers) {
         // "Name;" is how libcurl is told to send an empty field.
@@ -234,11 +240,16 @@ void CurlTask::complete(CURLcode code, bool cancelled)
     std::optional<Bytes> data;
     std::optional<Error> error;
 
-    if (cancelled) error = urlError(kUrlCancelled, "cancelled");
-    else if (timedOut) error = urlError(kUrlTimedOut, fmt::format("nothing received for {:g} s", toSeconds(timeout())));
-    else if (_tooLarge) error = urlError(kUrlTooLarge, fmt::format("more than {} bytes", _configuration.maximumResponseSize));
-    else if (_forbiddenHop) error = urlError(kUrlForbiddenRedirect, "redirected to a private address");
-    else if (code != CURLE_OK) error = urlErrorFromCurl(code, _errorText.data());
+    if (cancelled)
+        error = urlError(kUrlCancelled, "cancelled");
+    else if (timedOut)
+        error = urlError(kUrlTimedOut, fmt::format("nothing received for {:g} s", toSeconds(timeout())));
+    else if (_tooLarge)
+        error = urlError(kUrlTooLarge, fmt::format("more than {} bytes", _configuration.maximumResponseSize));
+    else if (_forbiddenHop)
+        error = urlError(kUrlForbiddenRedirect, "redirected to a private address");
+    else if (code != CURLE_OK)
+        error = urlErrorFromCurl(code, _errorText.data());
 
     if (_easy && !cancelled) {
         long status = 0;
@@ -320,8 +331,10 @@ void Loader::takeCommands()
         commands.swap(_commands);
     }
     for (Command& command : commands) {
-        if (!command.cancel) begin(command.task);
-        else if (command.task->easy()) end(command.task->easy(), CURLE_OK, true);
+        if (!command.cancel)
+            begin(command.task);
+        else if (command.task->easy())
+            end(command.task->easy(), CURLE_OK, true);
     }
 }
 
@@ -361,8 +374,10 @@ int Loader::nextTimeout()
     std::chrono::milliseconds shortest(std::chrono::hours(1));
     for (const auto& [easy, task] : _active) {
         const auto left = task->timeLeft(now);
-        if (left.count() <= 0) late.push_back(easy);
-        else shortest = std::min(shortest, left);
+        if (left.count() <= 0)
+            late.push_back(easy);
+        else
+            shortest = std::min(shortest, left);
     }
     for (CURL* easy : late) {
         _active.at(easy)->timedOut = true;
@@ -398,12 +413,11 @@ class CurlSession final : public UrlSession {
 public:
     CurlSession(std::shared_ptr<Loader> loader, UrlSessionConfiguration configuration, std::shared_ptr<Queue> queue)
         : _loader(std::move(loader)), _configuration(std::move(configuration)), _queue(std::move(queue))
-    {
-    }
+    {}
     std::shared_ptr<UrlTask> dataTask(UrlRequest request, DataCompletion completion) override
     {
-        return std::make_shared<CurlTask>(_loader, ++_lastIdentifier, std::move(request), _configuration, std::move(completion),
-                                          _queue);
+        return std::make_shared<CurlTask>(_loader, ++_lastIdentifier, std::move(request), _configuration,
+                                          std::move(completion), _queue);
     }
 
 private:
@@ -416,7 +430,8 @@ private:
 class CurlLoader final : public UrlLoader {
 public:
     ~CurlLoader() override { _loader->stop(); }
-    std::shared_ptr<UrlSession> makeSession(UrlSessionConfiguration configuration, std::shared_ptr<Queue> delegateQueue) override
+    std::shared_ptr<UrlSession> makeSession(UrlSessionConfiguration configuration,
+                                            std::shared_ptr<Queue> delegateQueue) override
     {
         return std::make_shared<CurlSession>(_loader, std::move(configuration), std::move(delegateQueue));
     }

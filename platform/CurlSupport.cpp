@@ -55,7 +55,8 @@ bool isPublicAddress(const std::string& address)
     if (inet_pton(AF_INET6, address.c_str(), &v6) == 1) {
         if (!IN6_IS_ADDR_V4MAPPED(&v6)) {
             const bool uniqueLocal = (v6.s6_addr[0] & 0xfe) == 0xfc;
-            return !(IN6_IS_ADDR_LOOPBACK(&v6) || IN6_IS_ADDR_UNSPECIFIED(&v6) || IN6_IS_ADDR_LINKLOCAL(&v6) || uniqueLocal);
+            return !(IN6_IS_ADDR_LOOPBACK(&v6) || IN6_IS_ADDR_UNSPECIFIED(&v6) || IN6_IS_ADDR_LINKLOCAL(&v6) ||
+                     uniqueLocal);
         }
         std::memcpy(&v4, v6.s6_addr + 12, sizeof v4);
     } else if (inet_pton(AF_INET, address.c_str(), &v4) != 1) {
@@ -108,9 +109,12 @@ std::string interfaceOf(const std::string& localIp)
         std::array<char, INET6_ADDRSTRLEN> text{};
         const int family = entry->ifa_addr->sa_family;
         const void* address = nullptr;
-        if (family == AF_INET) address = &reinterpret_cast<const sockaddr_in*>(entry->ifa_addr)->sin_addr;
-        else if (family == AF_INET6) address = &reinterpret_cast<const sockaddr_in6*>(entry->ifa_addr)->sin6_addr;
-        if (address && inet_ntop(family, address, text.data(), text.size()) && localIp == text.data()) return entry->ifa_name;
+        if (family == AF_INET)
+            address = &reinterpret_cast<const sockaddr_in*>(entry->ifa_addr)->sin_addr;
+        else if (family == AF_INET6)
+            address = &reinterpret_cast<const sockaddr_in6*>(entry->ifa_addr)->sin6_addr;
+        if (address && inet_ntop(family, address, text.data(), text.size()) && localIp == text.data())
+            return entry->ifa_name;
     }
     return {};
 }

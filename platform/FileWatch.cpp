@@ -17,8 +17,8 @@ struct FileWatch::Impl {
     fs::path path;
     std::function<void()> changed;
     FileHandle inotify{inotify_init1(IN_CLOEXEC | IN_NONBLOCK)};
-    int directory = -1;       // inotify's number for the directory that is watched
-    fs::path watched;         // that directory
+    int directory = -1; // inotify's number for the directory that is watched
+    fs::path watched;   // that directory
     std::unique_ptr<RunLoop::Watch> watch;
 
     /// Watches the file's directory, or the nearest parent that is there.
@@ -31,8 +31,8 @@ struct FileWatch::Impl {
         if (directory >= 0) inotify_rm_watch(inotify.fd(), directory);
         watched = nearest;
         directory = inotify_add_watch(inotify.fd(), nearest.c_str(),
-                                      IN_CREATE | IN_CLOSE_WRITE | IN_MOVED_TO | IN_MOVED_FROM | IN_DELETE | IN_DELETE_SELF |
-                                          IN_MOVE_SELF | IN_ONLYDIR);
+                                      IN_CREATE | IN_CLOSE_WRITE | IN_MOVED_TO | IN_MOVED_FROM | IN_DELETE |
+                                          IN_DELETE_SELF | IN_MOVE_SELF | IN_ONLYDIR);
     }
 
     void readEvents()
@@ -44,8 +44,10 @@ struct FileWatch::Impl {
         while ((size = read(inotify.fd(), buffer.data(), buffer.size())) > 0) {
             for (ssize_t at = 0; at < size;) {
                 const auto* event = reinterpret_cast<const inotify_event*>(buffer.data() + at);
-                if (event->len > 0 && watched / event->name == path) mine = true;
-                else if (event->len == 0 || watched != path.parent_path()) elsewhere = true;
+                if (event->len > 0 && watched / event->name == path)
+                    mine = true;
+                else if (event->len == 0 || watched != path.parent_path())
+                    elsewhere = true;
                 at += static_cast<ssize_t>(sizeof(inotify_event) + event->len);
             }
         }
@@ -65,7 +67,8 @@ FileWatch::FileWatch(RunLoop& runLoop, fs::path path, std::function<void()> chan
     _impl->changed = std::move(changed);
     if (!_impl->inotify) return; // out of instances: changes go unseen
     _impl->aim();
-    _impl->watch = runLoop.watch(_impl->inotify.fd(), EPOLLIN, [impl = _impl.get()](std::uint32_t) { impl->readEvents(); });
+    _impl->watch =
+        runLoop.watch(_impl->inotify.fd(), EPOLLIN, [impl = _impl.get()](std::uint32_t) { impl->readEvents(); });
 }
 
 FileWatch::~FileWatch() = default;

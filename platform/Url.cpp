@@ -19,7 +19,8 @@ Handle parsed(const std::string& text)
 {
     Handle handle(curl_url(), curl_url_cleanup);
     constexpr unsigned kFlags = CURLU_NON_SUPPORT_SCHEME | CURLU_NO_AUTHORITY;
-    if (!handle || curl_url_set(handle.get(), CURLUPART_URL, text.c_str(), kFlags) != CURLUE_OK) return {nullptr, curl_url_cleanup};
+    if (!handle || curl_url_set(handle.get(), CURLUPART_URL, text.c_str(), kFlags) != CURLUE_OK)
+        return {nullptr, curl_url_cleanup};
     return handle;
 }
 
@@ -35,7 +36,8 @@ std::optional<std::string> part(const std::string& text, CURLUPart which)
 
 std::string lowerCased(std::string text)
 {
-    std::ranges::transform(text, text.begin(), [](char c) { return c >= 'A' && c <= 'Z' ? static_cast<char>(c + 32) : c; });
+    std::ranges::transform(text, text.begin(),
+                           [](char c) { return c >= 'A' && c <= 'Z' ? static_cast<char>(c + 32) : c; });
     return text;
 }
 
@@ -138,7 +140,8 @@ std::optional<unsigned> Url::port() const
 {
     const auto text = part(_text, CURLUPART_PORT);
     unsigned port = 0;
-    if (!text || std::from_chars(text->data(), text->data() + text->size(), port).ec != std::errc()) return std::nullopt;
+    if (!text || std::from_chars(text->data(), text->data() + text->size(), port).ec != std::errc())
+        return std::nullopt;
     return port;
 }
 

@@ -8,8 +8,8 @@
 #include <set>
 #include <sys/file.h>
 
-#include "platform/FileWatch.h"
 #include "platform/Files.h"
+#include "platform/FileWatch.h"
 #include "platform/Log.h"
 #include "platform/Queue.h"
 
@@ -43,7 +43,8 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
         if (!bytes) return std::unexpected(std::move(bytes.error()));
         auto value = parseJson(bytes->view(), kMaximumSize);
         if (!value) return std::unexpected(std::move(value.error()));
-        if (!value->asDictionary()) return std::unexpected(Error::withReason(std::string(kFormatErrorDomain), 1, "not a JSON object"));
+        if (!value->asDictionary())
+            return std::unexpected(Error::withReason(std::string(kFormatErrorDomain), 1, "not a JSON object"));
         return *value->asDictionary();
     }
 
@@ -53,12 +54,15 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
         std::lock_guard lock(mutex);
         fileIsBroken = !contents;
         if (!contents) {
-            defaultLog().error("user defaults {} can't be read, defaults apply: {}", path.string(), contents.error().description());
+            defaultLog().error("user defaults {} can't be read, defaults apply: {}", path.string(),
+                               contents.error().description());
             contents = Dictionary();
         }
         for (const std::string& key : dirty) {
-            if (const Value* mine = values.find(key)) contents->set(key, *mine);
-            else contents->remove(key);
+            if (const Value* mine = values.find(key))
+                contents->set(key, *mine);
+            else
+                contents->remove(key);
         }
         values = std::move(*contents);
     }
@@ -69,7 +73,8 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
         std::lock_guard writer(writing);
         if (auto made = files->createDirectories(path.parent_path()); !made) return writeFailed(made.error());
         // Against others who edit the file in the same way; where there can be no lock, we go on without.
-        const FileHandle lockFile(open((path.string() + ".lock").c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600));
+        const FileHandle lockFile(
+            open((path.string() + ".lock").c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600));
         if (lockFile) flock(lockFile.fd(), LOCK_EX);
 
         auto contents = readFile();
@@ -82,8 +87,10 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
             if (dirty.empty()) return;
             written.swap(dirty);
             for (const std::string& key : written) {
-                if (const Value* mine = values.find(key)) merged.set(key, *mine);
-                else merged.remove(key);
+                if (const Value* mine = values.find(key))
+                    merged.set(key, *mine);
+                else
+                    merged.remove(key);
             }
             values = merged;
             fileIsBroken = false;
@@ -100,7 +107,8 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
     {
         std::error_code failed;
         fs::rename(path, path.string() + ".corrupt", failed);
-        if (!failed) defaultLog().error("user defaults {} are broken, kept as {}.corrupt", path.string(), path.string());
+        if (!failed)
+            defaultLog().error("user defaults {} are broken, kept as {}.corrupt", path.string(), path.string());
     }
 
     void writeFailed(const Error& error) const
@@ -143,7 +151,8 @@ bool UserDefaults::boolean(std::string_view key) const
     const std::string* text = found.asString();
     if (!text) return false;
     std::string lowered = *text;
-    std::ranges::transform(lowered, lowered.begin(), [](unsigned char c) { return static_cast<char>(std::tolower(c)); });
+    std::ranges::transform(lowered, lowered.begin(),
+                           [](unsigned char c) { return static_cast<char>(std::tolower(c)); });
     return lowered == "true" || lowered == "yes" || lowered == "1";
 }
 
@@ -175,8 +184,10 @@ void UserDefaults::set(std::string_view key, Value value)
 {
     std::lock_guard lock(_impl->mutex);
     if (const auto date = value.asDate()) value = secondsSince1970(*date);
-    if (value.isNull()) _impl->values.remove(key);
-    else _impl->values.set(std::string(key), std::move(value));
+    if (value.isNull())
+        _impl->values.remove(key);
+    else
+        _impl->values.set(std::string(key), std::move(value));
     if (!_impl->files) return;
     _impl->dirty.emplace(key);
     if (!_impl->writeQueue || std::exchange(_impl->writeQueued, true)) return;

@@ -1,0 +1,21 @@
+#include "platform/LocationSource.h"
+
+#include <algorithm>
+#include <cmath>
+#include <numbers>
+
+namespace platform {
+
+Location fuzz(double latitude, double longitude, std::string source)
+{
+    constexpr double kCell = 0.01; // degrees of latitude: 1.1 km
+    const auto middle = [](double value, double cell) { return (std::floor(value / cell) + 0.5) * cell; };
+    latitude = std::clamp(latitude, -90.0, 90.0);
+    const double row = std::clamp(middle(latitude, kCell), -90.0, 90.0);
+    // A degree of longitude shrinks towards the poles; the cell is made wider by as much, up to a whole circle.
+    const double shrink = std::max(std::cos(row * std::numbers::pi / 180), kCell / 360);
+    const double column = middle(longitude, kCell / shrink);
+    return {.latitude = row, .longitude = std::clamp(column, -180.0, 180.0), .source = std::move(source)};
+}
+
+} // namespace platform
