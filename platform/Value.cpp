@@ -1,5 +1,7 @@
 #include "platform/Value.h"
 
+#include <array>
+
 namespace platform {
 
 namespace {
@@ -186,6 +188,13 @@ bool operator==(const Value& a, const Value& b)
                 return mine == other;
         },
         a._storage);
+}
+
+std::string_view typeName(Value::Type type)
+{
+    static constexpr std::array<std::string_view, 10> kNames{"null",   "bool",  "integer", "integer", "double",
+                                                             "string", "bytes", "date",    "array",   "dictionary"};
+    return kNames[static_cast<std::size_t>(type)];
 }
 
 } // namespace platform

@@ -112,6 +112,9 @@ private:
         _storage;
 };
 
+/// "null", "bool", … for error texts.
+[[nodiscard]] std::string_view typeName(Value::Type type);
+
 /// String keys to values, in the order in which the keys were first set.
 ///
 /// Look-up is linear up to a few entries and hashed above, so a hostile document of a million keys costs no
