@@ -16,6 +16,7 @@ class LocaleSource;
 class LocationSource;
 class NotificationCenter;
 class ProcessIdentity;
+class RunLoop;
 class Transactions;
 class UrlLoader;
 class UserDefaults;
@@ -30,6 +31,10 @@ public:
     /// Posts `name` ("com.quorvane.…"); nothing where there is no session bus. Any thread.
     virtual void post(const std::string& name) = 0;
 };
+
+/// The signal "Posted" (the name) of com.quorvane.Notify, on the user's session bus, connected to when there is something to
+/// tell.
+[[nodiscard]] std::unique_ptr<SystemNotifier> makeSessionBusNotifier(RunLoop& runLoop);
 
 /// The device that the daemon runs on: what a service needs from outside, by role. Plain references, set once and never
 /// null; whoever makes a Device keeps its parts alive longer than every service. tests/support has one of twins.

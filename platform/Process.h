@@ -1,7 +1,9 @@
 #pragma once
 
+#include <memory>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <sys/types.h>
 
 #include "platform/Error.h"
@@ -21,5 +23,10 @@ public:
 };
 
 [[nodiscard]] std::unique_ptr<ProcessIdentity> makeProcessIdentity();
+
+/// The application's name in the text of a .flatpak-info file.
+[[nodiscard]] std::optional<std::string> flatpakName(std::string_view info);
+/// The application id in the name of the systemd unit that its launcher made: "app-gnome-org.example.App-12.scope".
+[[nodiscard]] std::optional<std::string> applicationOfUnit(std::string_view unit);
 
 } // namespace platform

@@ -1,0 +1,85 @@
+#include "platform/SystemDevice.h"
+
+#include "platform/Clock.h"
+#include "platform/Counters.h"
+#include "platform/Device.h"
+#include "platform/DeviceProfile.h"
+#include "platform/Ipc.h"
+#include "platform/LocaleSource.h"
+#include "platform/LocationSource.h"
+#include "platform/NotificationCenter.h"
+#include "platform/Process.h"
+#include "platform/RunLoop.h"
+#include "platform/Transactions.h"
+#include "platform/UrlSession.h"
+#include "platform/UserDefaults.h"
+
+namespace platform {
+
+struct SystemDevice::Impl {
+    Impl(RunLoop& runLoop, const std::string& name, const std::string& sharedSuite)
+        : clock(makeSystemClock(runLoop)),
+          storeQueue(Queue::make(name + ".store", Queue::Kind::Serial, pool, *clock, Priority::Background)),
+          files(makeSystemFiles()), directories(Directories::fromEnvironment()),
+          userDefaults(*files, directories.config / (name + ".json"), storeQueue),
+          lookupDefaults(*files, directories.config / (sharedSuite + ".json"), storeQueue),
+          counters(*files, directories.state / name / "counters.json", storeQueue), locale(makeLocaleSource(runLoop)),
+          location(makeGeoClueLocationSource(runLoop)),
+          profile(makeDeviceProfileSource(*files, directories.config / name / "device.json", runLoop)),
+          processes(makeProcessIdentity()), notifier(makeSessionBusNotifier(runLoop)),
+          ipc(ipc::makeBusTransport(runLoop, pool, *clock, directories.runtime / name)), loader(makeCurlLoader()),
+          device{.clock = *clock,
+                 .executor = pool,
+                 .mainExecutor = runLoop,
+                 .files = *files,
+                 .directories = directories,
+                 .userDefaults = userDefaults,
+                 .lookupDefaults = lookupDefaults,
+                 .notifications = notifications,
+                 .counters = counters,
+                 .transactions = transactions,
+                 .locale = *locale,
+                 .location = *location,
+                 .profile = *profile,
+                 .processes = *processes,
+                 .systemNotifier = *notifier,
+                 .urlLoader = *loader,
+                 .ipc = *ipc}
+    {
+        device.makeQueues();
+        userDefaults.watch(runLoop);
+        lookupDefaults.watch(runLoop);
+    }
+
+    WorkerPool pool;
+    std::unique_ptr<Clock> clock;
+    std::shared_ptr<Queue> storeQueue;
+    std::unique_ptr<FileSystem> files;
+    Directories directories;
+    UserDefaults userDefaults;
+    UserDefaults lookupDefaults;
+    NotificationCenter notifications;
+    CounterStore counters;
+    Transactions transactions;
+    std::unique_ptr<LocaleSource> locale;
+    std::unique_ptr<LocationSource> location;
+    std::unique_ptr<DeviceProfileSource> profile;
+    std::unique_ptr<ProcessIdentity> processes;
+    std::unique_ptr<SystemNotifier> notifier;
+    std::unique_ptr<ipc::Transport> ipc;
+    std::unique_ptr<UrlLoader> loader;
+    Device device;
+};
+
+SystemDevice::SystemDevice(RunLoop& runLoop, const std::string& name, const std::string& sharedSuite)
+    : _impl(std::make_unique<Impl>(runLoop, name, sharedSuite))
+{}
+
+SystemDevice::~SystemDevice() = default;
+
+Device& SystemDevice::device()
+{
+    return _impl->device;
+}
+
+} // namespace platform
