@@ -239,7 +239,8 @@ ipc::Handler endpointHandler(std::weak_ptr<TAVEndpointXPC> object)
             if (!configuration && configuration.error() == Refusal::Malformed) return;
             auto request = record<TAVRequest>(arguments, 0, "request", reply);
             if (request)
-                return endpoint->request(std::move(*request), configuration.value_or(nullptr), requestReply(std::move(reply)));
+                return endpoint->request(std::move(*request), configuration.value_or(nullptr),
+                                         requestReply(std::move(reply)));
             if (request.error() == Refusal::UnknownClass) reply.abandon();
         } else if (member == "LoadImages") {
             endpoint->loadImages(*arguments.args[0].asArray(), arguments.args[1].asUInt().value_or(0),

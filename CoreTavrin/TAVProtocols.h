@@ -32,12 +32,14 @@ public:
     virtual ~TAVDaemonXPC() = default;
     /// Introduces the client; answers the address of the endpoint for `TAVEndpointXPC`. An invalid configuration is not
     /// answered: the connection is closed.
-    virtual void configure(std::shared_ptr<TAVSessionConfiguration> configuration, platform::Reply<std::string> reply) = 0;
+    virtual void configure(std::shared_ptr<TAVSessionConfiguration> configuration,
+                           platform::Reply<std::string> reply) = 0;
     virtual void bag(BagReply reply) = 0;
     virtual void request(std::shared_ptr<TAVRequest> request, RequestReply reply) = 0;
     virtual void reportEvent(const std::string& event, std::int64_t queryId, std::shared_ptr<ZRFeedback> feedback) = 0;
     /// The current session's feedback, as the dictionaries that are uploaded, with relative times.
-    virtual void feedback(const std::string& argument, platform::Reply<platform::Value::Array, OptionalError> reply) = 0;
+    virtual void feedback(const std::string& argument,
+                          platform::Reply<platform::Value::Array, OptionalError> reply) = 0;
     /// The address of the flusher bridge, for `TAVFlusherXPC`.
     virtual void listenToFlusher(platform::Reply<std::string> reply) = 0;
     /// One {"identifier", "agent"} for each client known.
@@ -70,7 +72,8 @@ public:
     virtual void request(std::shared_ptr<TAVRequest> request, std::shared_ptr<TAVSessionConfiguration> configuration,
                          RequestReply reply) = 0;
     /// The bytes of images by "url" or "id", as many as are there within `timeout` nanoseconds.
-    virtual void loadImages(platform::Value::Array images, std::uint64_t timeout, platform::Reply<platform::Value> reply) = 0;
+    virtual void loadImages(platform::Value::Array images, std::uint64_t timeout,
+                            platform::Reply<platform::Value> reply) = 0;
 };
 
 /// What the flusher bridge takes from a diagnostic tool. Calls arrive on that connection's queue.
@@ -103,7 +106,8 @@ public:
 
 /// The peer's side of a connection, which the proxy doesn't keep alive.
 [[nodiscard]] std::shared_ptr<TAVClientXPC> makeClientProxy(std::weak_ptr<platform::ipc::Connection> connection);
-[[nodiscard]] std::shared_ptr<TAVFlusherListener> makeFlusherListenerProxy(std::weak_ptr<platform::ipc::Connection> connection);
+[[nodiscard]] std::shared_ptr<TAVFlusherListener>
+makeFlusherListenerProxy(std::weak_ptr<platform::ipc::Connection> connection);
 
 /// An error as a{sv} (domain, code, userInfo), the empty dictionary for none; and back.
 [[nodiscard]] platform::Value valueFromError(const OptionalError& error);
