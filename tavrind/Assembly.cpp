@@ -1,0 +1,15 @@
+#include "tavrind/Assembly.h"
+
+#include "platform/Device.h"
+#include "platform/UserDefaults.h"
+
+namespace tavrin {
+
+Assembly::Assembly(platform::Device& device_)
+    : device(device_), diagnosticData(device_.counters), userDefaults(device_.userDefaults), fileManager(device_.files),
+      notificationCenter(device_.notifications), sharedSession(device_.userDefaults.boolean("TAVSharedSession"))
+{}
+
+Assembly::~Assembly() = default;
+
+} // namespace tavrin

@@ -1,0 +1,69 @@
+#pragma once
+
+#include <memory>
+
+#include "tavrind/TavrinDiagnosticDataReporter.h"
+
+namespace platform {
+struct Device;
+class FileSystem;
+class NotificationCenter;
+class UrlSession;
+class UserDefaults;
+} // namespace platform
+
+namespace tavrin {
+
+class AppWhitelistController;
+class BackgroundActivitiesManager;
+class ClientSessionManager;
+class ClientStateManager;
+class DownloadManager;
+class Lookup;
+class TAVNetworkRequestFactory;
+class TavrinBagController;
+class TavrinFeedbackFlusher;
+class TavrinFlusherXPC;
+class TavrinPersistentStorage;
+class TavrinSubscriptionManager;
+class TavrinUserGUIDController;
+
+/// Every long-lived service of the daemon, in one place.
+///
+/// Services are made once, in the order that Startup.cpp fixes, and live as long as the assembly. Each takes the
+/// assembly and reaches its siblings through it, when it needs them: while the start-up order runs, those made later
+/// are still null. After start-up nothing here changes, so any thread may read it.
+struct Assembly {
+    explicit Assembly(platform::Device& device);
+    ~Assembly();
+    Assembly(const Assembly&) = delete;
+    Assembly& operator=(const Assembly&) = delete;
+
+    platform::Device& device;
+    TavrinDiagnosticDataReporter diagnosticData;
+
+    std::shared_ptr<platform::UrlSession> urlSession;         ///< foreground: every request of a client
+    std::shared_ptr<platform::UrlSession> bagSession;         ///< without caching
+    std::shared_ptr<platform::UrlSession> downloadURLSession; ///< resources
+    std::shared_ptr<platform::UrlSession> uploadURLSession;   ///< feedback
+    platform::UserDefaults& userDefaults;
+    platform::FileSystem& fileManager;
+    platform::NotificationCenter& notificationCenter;
+    std::shared_ptr<TAVNetworkRequestFactory> requestFactory;
+    std::shared_ptr<TavrinBagController> bagController;
+    std::shared_ptr<DownloadManager> downloadManager;
+    std::shared_ptr<ClientStateManager> clientStateManager;
+    std::shared_ptr<BackgroundActivitiesManager> backgroundFlusher;
+    std::shared_ptr<TavrinUserGUIDController> guidController;
+    std::shared_ptr<ClientSessionManager> clientSessionManager;
+    std::shared_ptr<Lookup> lookup;
+    bool sharedSession;         ///< all clients share one session and one GUID
+    bool testFeedbacks = false; ///< sessions keep their feedback in memory too
+    std::shared_ptr<TavrinSubscriptionManager> subscriptionManager;
+    std::shared_ptr<TavrinFeedbackFlusher> crowdsourcingFeedbackFlusher;
+    std::shared_ptr<TavrinFlusherXPC> flusherXPCListener;
+    std::shared_ptr<AppWhitelistController> appWhitelistController;
+    std::shared_ptr<TavrinPersistentStorage> persistentStorage;
+};
+
+} // namespace tavrin

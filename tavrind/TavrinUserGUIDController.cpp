@@ -1,0 +1,45 @@
+#include "tavrind/TavrinUserGUIDController.h"
+
+#include "platform/Clock.h"
+#include "platform/Device.h"
+#include "platform/NotificationCenter.h"
+#include "tavrind/Assembly.h"
+
+namespace tavrin {
+namespace {
+constexpr std::chrono::seconds kLifetime{900};
+}
+
+TavrinUserGUIDController::TavrinUserGUIDController(Assembly& assembly)
+    : _assembly(assembly), _queue(assembly.device.serialQueue("com.quorvane.tavrin.guid")),
+      _lastKnownUserGUID(platform::Uuid::random()),
+      _lastKnownUserGUIDExpirationDate(assembly.device.clock.wallNow() + kLifetime)
+{}
+
+platform::Uuid TavrinUserGUIDController::currentUserGUID()
+{
+    return _queue->sync([this] {
+        if (_assembly.device.clock.wallNow() >= _lastKnownUserGUIDExpirationDate) _rollGUID();
+        return _lastKnownUserGUID;
+    });
+}
+
+void TavrinUserGUIDController::reset()
+{
+    _queue->async([self = shared_from_this()] { self->_rollGUID(); });
+}
+
+void TavrinUserGUIDController::_rollGUID()
+{
+    _queue->assertOnQueue();
+    _lastKnownUserGUID = platform::Uuid::random();
+    _lastKnownUserGUIDExpirationDate = _assembly.device.clock.wallNow() + kLifetime;
+    _queue->async([weak = weak_from_this()] {
+        auto self = weak.lock();
+        if (!self) return;
+        self->_assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.userguid");
+        self->_assembly.notificationCenter.post({.name = TAVUserGUIDChangeNotification});
+    });
+}
+
+} // namespace tavrin
