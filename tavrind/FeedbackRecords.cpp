@@ -1,0 +1,28 @@
+#include "tavrind/FeedbackRecords.h"
+
+#include "searchrecords/ZRNetworkFeedback.h"
+
+namespace tavrin {
+
+std::shared_ptr<ZRStartNetworkSearchFeedback> startNetworkSearchFeedback(std::string input,
+                                                                         const platform::UrlRequest& request,
+                                                                         StartSearchTrigger trigger,
+                                                                         EndpointType endpoint)
+{
+    return std::make_shared<ZRStartNetworkSearchFeedback>(std::move(input), request.url.string(),
+                                                          headerDictionary(request.headers), trigger, endpoint);
+}
+
+platform::Value headerDictionary(const platform::HttpHeaders& headers)
+{
+    platform::Dictionary dictionary;
+    for (const auto& [name, value] : headers) dictionary.set(name, value);
+    return dictionary;
+}
+
+std::string describe(const platform::HttpHeaders& headers)
+{
+    return platform::toJson(headerDictionary(headers));
+}
+
+} // namespace tavrin

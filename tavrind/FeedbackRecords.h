@@ -1,0 +1,25 @@
+#pragma once
+
+#include <memory>
+#include <string>
+
+#include "platform/Url.h"
+#include "platform/UrlSession.h"
+#include "searchrecords/ZREnums.h"
+
+namespace tavrin {
+
+struct ZRStartNetworkSearchFeedback;
+
+/// The record of a request that is about to be sent.
+[[nodiscard]] std::shared_ptr<ZRStartNetworkSearchFeedback>
+startNetworkSearchFeedback(std::string input, const platform::UrlRequest& request, StartSearchTrigger trigger,
+                           EndpointType endpoint);
+
+/// Header fields as a dictionary of strings; of fields of one name the last counts.
+[[nodiscard]] platform::Value headerDictionary(const platform::HttpHeaders& headers);
+
+/// Header fields for a log line.
+[[nodiscard]] std::string describe(const platform::HttpHeaders& headers);
+
+} // namespace tavrin

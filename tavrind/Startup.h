@@ -1,0 +1,35 @@
+#pragma once
+
+#include <memory>
+
+#include "platform/Error.h"
+#include "tavrind/Assembly.h"
+
+namespace platform {
+struct Device;
+namespace ipc {
+class Listener;
+}
+} // namespace platform
+
+namespace tavrin {
+
+class TavrinDPAppDeepLinkIngester;
+class TavrinService;
+
+/// A daemon that has been started: the services, and what only the entry point holds.
+struct Daemon {
+    explicit Daemon(platform::Device& device);
+    ~Daemon();
+
+    Assembly assembly;
+    std::shared_ptr<TavrinDPAppDeepLinkIngester> deepLinkIngester;
+    std::shared_ptr<TavrinService> service;
+    std::unique_ptr<platform::ipc::Listener> listener;
+};
+
+/// Builds the services in their fixed order and opens the door. An error only where the service's socket can't be had,
+/// for example because another daemon serves it.
+[[nodiscard]] platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device);
+
+} // namespace tavrin

@@ -1,0 +1,564 @@
+#include "tavrind/TAVNetworkRequestFactory.h"
+
+#include <fmt/format.h>
+
+#include "CoreTavrin/TAVBag.h"
+#include "CoreTavrin/TAVRequest.h"
+#include "platform/Device.h"
+#include "platform/DeviceProfile.h"
+#include "platform/LanguageRecognizer.h"
+#include "platform/LocaleSource.h"
+#include "platform/UserDefaults.h"
+#include "tavrind/AppWhitelistController.h"
+#include "tavrind/Assembly.h"
+#include "tavrind/ClientSessionManager.h"
+#include "tavrind/TavrinBagController.h"
+#include "tavrind/TavrinLogging.h"
+#include "tavrind/TavrinURLRequestBuilder.h"
+#include "tavrind/TavrinUserGUIDController.h"
+
+namespace tavrin {
+
+using platform::Duration;
+using platform::QueryItem;
+using platform::Url;
+using platform::UrlRequest;
+using platform::Uuid;
+using platform::Value;
+
+namespace {
+
+constexpr const char* kApiKey = "walrus7351";
+constexpr const char* kDownloadUserAgent = "Vistrel/1";
+
+const platform::Log& log()
+{
+    return TavrinLogForCategory(kLogRequest);
+}
+
+// The kinds of request, as bits: a rule of the table below names those that it applies to.
+enum Kind : unsigned {
+    kBagFetch = 1 << 0,
+    kBagCache = 1 << 1,
+    kSearch = 1 << 2,
+    kZeroKeyword = 1 << 3,
+    kMoreResults = 1 << 4,
+    kLookup = 1 << 5,
+    kCard = 1 << 6,
+    kFlight = 1 << 7,
+    kDownload = 1 << 8,
+    kUpload = 1 << 9,
+};
+constexpr unsigned kClient = kSearch | kZeroKeyword | kMoreResults | kLookup | kCard | kFlight;
+
+} // namespace
+
+/// What one request is made of, beside the context.
+struct TAVNetworkRequestFactory::Recipe {
+    Kind kind;
+    TavrinURLRequestBuilder builder;
+    const TAVRequest* request = nullptr;
+    const TAVBag* bag = nullptr;
+    Uuid userGuid;
+    std::uint64_t fieldMask = 0;
+    std::string userAgent;
+    std::string version;
+    std::string digest;
+    bool includeLatLong = false;
+    std::string signature; // of the installed applications
+    std::optional<Duration> timeout;
+
+    void item(const char* name, const std::string& value)
+    {
+        if (!value.empty()) builder.defaultQueryItemWithName(name, value);
+    }
+    void header(const char* name, const std::string& value)
+    {
+        if (!value.empty()) builder.defaultHttpHeaderWithName(name, value);
+    }
+    [[nodiscard]] bool masked() const
+    {
+        return (fieldMask & kFieldMaskNoLocation) && (kind & (kSearch | kZeroKeyword | kMoreResults));
+    }
+
+    static void addLookupItems(Recipe& r, const RequestContext&);
+
+    /// One shared item or header: for which kinds, and how it is made. An empty value is left out.
+    struct Rule {
+        unsigned kinds;
+        void (*apply)(Recipe&, const RequestContext&);
+    };
+    static const std::vector<Rule> kRules; // the table of docs/requests.md
+};
+
+const std::vector<TAVNetworkRequestFactory::Recipe::Rule> TAVNetworkRequestFactory::Recipe::kRules{
+    {kBagFetch | kClient | kDownload | kUpload, [](auto& r, auto&) { r.item("key", kApiKey); }},
+    {kBagFetch | kBagCache, [](auto& r, auto&) { r.item("version", r.version); }},
+    {kBagCache, [](auto& r, auto&) { r.item("agent", r.userAgent); }},
+    {kBagFetch | kBagCache | kClient | kUpload, [](auto& r, auto& c) { r.item("locale", c.localeIdentifier); }},
+    {kBagFetch | kBagCache | kClient, [](auto& r, auto& c) { r.item("esl", c.effectiveSystemLanguage); }},
+    {kBagFetch | kBagCache | (kClient & ~kMoreResults) | kUpload,
+     [](auto& r, auto& c) { r.item("cc", c.geoDeviceCountryCode); }},
+    {kBagFetch | kClient | kUpload, [](auto& r, auto& c) { r.header("X-Quorvane-Languages", c.preferredLanguages); }},
+    {kSearch, [](auto& r, auto&) { r.item("card", "1"); }},
+    {kSearch,
+     [](auto& r, auto&) {
+         if (r.request->topics.count() > 0) r.header("X-Quorvane-TopTopics", platform::toJson(r.request->topics));
+     }},
+    {kSearch | kZeroKeyword | kLookup | kFlight,
+     [](auto& r, auto&) { r.item("kb_ime", r.request->keyboardInputMode.value_or("")); }},
+    {kSearch | kZeroKeyword,
+     [](auto& r, auto& c) {
+         r.item("calendar", c.localeCalendarIdentifier);
+         r.item("time_zone", c.localTimeZoneName);
+         r.item("units", c.localeMeasurementSystem);
+     }},
+    {kSearch, [](auto& r, auto& c) { r.item("24h", c.is24hDateFormat); }},
+    {kClient & ~kMoreResults, [](auto& r, auto& c) { r.header("X-Quorvane-GeoMetadata", c.geoClientMetadata); }},
+    {kClient,
+     [](auto& r, auto& c) {
+         if (r.masked()) return;
+         r.item("latlng", c.geoLocationLatLng);
+         r.item("geosrc", c.geoLocationSource);
+     }},
+    {kClient & ~kZeroKeyword,
+     [](auto& r, auto&) {
+         if (!r.masked()) r.header("X-Quorvane-Whitelisted-App-Signature", r.signature);
+     }},
+    {kClient & ~kCard, [](auto& r, auto& c) { r.item("mode", c.isManagedAccount ? "managed" : ""); }},
+    {kClient, [](auto& r, auto& c) { r.item("storefront", c.storeFrontIdentifier); }},
+    {kClient, [](auto& r, auto& c) { r.header("X-Quorvane-Subscriptions", c.subscriptionInfo); }},
+    {kClient,
+     [](auto& r, auto& c) {
+         const Uuid& guid = r.userGuid.isNil() ? c.userGuid : r.userGuid;
+         if (!guid.isNil()) r.header("X-Quorvane-UserGuid", guid.string());
+     }},
+    {kBagFetch | kClient | kDownload | kUpload, [](auto& r, auto&) { r.header("User-Agent", r.userAgent); }},
+    {kClient,
+     [](auto& r, auto&) {
+         if (r.request->scale > 0) r.header("X-Quorvane-UI-Scale", fmt::format("{:.1f}", r.request->scale));
+     }},
+    {kSearch | kZeroKeyword | kCard,
+     [](auto& r, auto& c) {
+         if (r.bag && r.bag->sendGeoEnvironmentHeader()) r.header("X-Quorvane-GeoEnvironment", c.geoEnvironment);
+     }},
+    {kClient & ~kMoreResults, [](auto& r, auto& c) { r.header("X-Quorvane-GeoSession", c.geoSessionId); }},
+    {kLookup, &Recipe::addLookupItems},
+    {kDownload,
+     [](auto& r, auto& c) {
+         if (r.includeLatLong) r.header("X-Quorvane-FuzzedLatLong", c.lookupGeoLocationLatLng);
+     }},
+    {kDownload, [](auto& r, auto&) { r.header("If-None-Match", r.version); }},
+    {kUpload, [](auto& r, auto&) { r.header("X-Quorvane-Digest", r.digest); }},
+};
+
+void TAVNetworkRequestFactory::Recipe::addLookupItems(Recipe& r, const RequestContext&)
+{
+    const auto& lookup = static_cast<const TAVLookupRequest&>(*r.request);
+    const auto language = [](const std::string& text) {
+        std::string recognized = platform::recognizedLanguage(text);
+        return recognized == "und" ? std::string() : recognized;
+    };
+    r.item("context", lookup.clientContext.value_or(""));
+    r.item("ldomain", lookup.hintDomain.value_or(""));
+    r.item("ltype", lookup.selectionType == LookupSelectionType::HintTap    ? "hint"
+                    : lookup.selectionType == LookupSelectionType::Explicit ? "explicit"
+                                                                            : "default");
+    r.item("qlang", language(lookup.queryString));
+    r.item("lctxlang", language(lookup.queryContext.value_or("")));
+}
+
+std::shared_ptr<TAVNetworkRequestFactory> TAVNetworkRequestFactory::make(Assembly& assembly)
+{
+    auto factory = std::make_shared<TAVNetworkRequestFactory>(assembly);
+    const std::weak_ptr<TAVNetworkRequestFactory> weak = factory;
+    platform::Device& device = assembly.device;
+
+    // What requests carry is computed off the start-up path; the first recipe waits behind it on the queue.
+    factory->_contextAccessQueue->barrierAsync([weak] {
+        auto self = weak.lock();
+        if (!self) return;
+        self->_setUpDebuggingQueryItems();
+        self->_updateLocale();
+        self->_updateTimeZone();
+        self->_updateProfile(self->_assembly.device.profile.profile());
+    });
+
+    device.locale.onChange([weak](platform::LocaleSource::Change change) {
+        auto self = weak.lock();
+        if (!self) return;
+        self->_contextAccessQueue->barrierAsync([weak, change] {
+            auto again = weak.lock();
+            if (!again) return;
+            if (change == platform::LocaleSource::Change::TimeZone) return again->_updateTimeZone();
+            again->_updateLocale();
+            again->_updateProfile(again->_assembly.device.profile.profile()); // the country may be the locale's
+            again->_notifyBagRefreshRequired();
+        });
+    });
+    device.profile.onChange([weak](const platform::DeviceProfile& profile) {
+        auto self = weak.lock();
+        if (!self) return;
+        self->_contextAccessQueue->barrierAsync([weak, profile] {
+            auto again = weak.lock();
+            if (!again) return;
+            const std::string before = again->_context.geoDeviceCountryCode;
+            again->_updateProfile(profile);
+            if (again->_context.geoDeviceCountryCode != before) again->_notifyBagRefreshRequired();
+        });
+    });
+    device.location.onChange([weak](const std::optional<platform::Location>& location, const std::string& reason) {
+        auto self = weak.lock();
+        if (!self) return;
+        self->_contextAccessQueue->barrierAsync([weak, location, reason] {
+            if (auto again = weak.lock()) again->_updateLocation(location, reason);
+        });
+    });
+
+    factory->_bagObserver = assembly.notificationCenter.observe(
+        TAVBagChangeNotification, [weak](const platform::Notification& notification) {
+            auto self = weak.lock();
+            if (!self) return;
+            if (auto bag = notification.get<std::shared_ptr<const TAVBag>>("bag")) self->bagChangeNotification(bag);
+        });
+    factory->_guidObserver =
+        assembly.notificationCenter.observe(TAVUserGUIDChangeNotification, [weak](const platform::Notification&) {
+            if (auto self = weak.lock()) self->guuidChangeNotification();
+        });
+    return factory;
+}
+
+TAVNetworkRequestFactory::TAVNetworkRequestFactory(Assembly& assembly)
+    : _assembly(assembly), _contextAccessQueue(assembly.device.concurrentQueue("com.quorvane.tavrind.contextaccess"))
+{}
+
+TAVNetworkRequestFactory::~TAVNetworkRequestFactory() = default;
+
+UrlRequest TAVNetworkRequestFactory::build(Recipe& recipe)
+{
+    // Asked for before the queue is entered: the controllers have queues of their own.
+    if ((recipe.kind & kClient & ~kZeroKeyword) && _assembly.appWhitelistController)
+        recipe.signature = _assembly.appWhitelistController->signature();
+
+    UrlRequest request = _contextAccessQueue->sync([&] {
+        if (recipe.request)
+            for (const auto& item : recipe.request->queryItems)
+                if (item) recipe.builder.forceQueryItemWithName(item->name, item->value);
+        if (recipe.kind != kDownload) recipe.builder.forceQueryItemsFromArray(_context.debuggingQueryItems);
+        for (const Recipe::Rule& rule : Recipe::kRules)
+            if (rule.kinds & recipe.kind) rule.apply(recipe, _context);
+        return recipe.builder.createMutableUrlRequest();
+    });
+
+    request.timeout = recipe.timeout;
+    if (!request.timeout && recipe.bag)
+        if (const auto seconds = recipe.bag->timeoutIntervalForRequest())
+            request.timeout = platform::durationFromSeconds(*seconds);
+    return request;
+}
+
+UrlRequest TAVNetworkRequestFactory::bagFetchRequest(const TavrinBagController& controller,
+                                                     const std::string& userAgent, const std::string& version)
+{
+    const Url url = controller.bagFetchURLWithCountry(_deviceCountryCode());
+    Recipe recipe{.kind = kBagFetch, .builder = TavrinURLRequestBuilder::requestBuilderWithURL(url)};
+    recipe.userAgent = userAgent;
+    recipe.version = version;
+    UrlRequest request = build(recipe);
+    request.cachePolicy = UrlRequest::CachePolicy::ReloadIgnoringCache;
+    return request;
+}
+
+UrlRequest TAVNetworkRequestFactory::bagCacheRequest(const TavrinBagController& controller,
+                                                     const std::string& userAgent, const std::string& version)
+{
+    const Url url = controller.bagFetchURLWithCountry(_deviceCountryCode());
+    Recipe recipe{.kind = kBagCache, .builder = TavrinURLRequestBuilder::requestBuilderWithURL(url)};
+    recipe.userAgent = userAgent;
+    recipe.version = version;
+    return build(recipe);
+}
+
+namespace {
+
+bool isSuggested(const TAVRequest& request)
+{
+    return request.triggerEvent == StartSearchTrigger::Suggestion ||
+           request.triggerEvent == StartSearchTrigger::PartialSuggestion;
+}
+
+} // namespace
+
+TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::searchRequest(const TAVRequest& request, const TAVBag& bag,
+                                                                          const Uuid& userGuid, std::uint64_t fieldMask,
+                                                                          std::optional<Duration> timeout)
+{
+    const auto url = bag.searchURL();
+    if (!url) return std::nullopt;
+    _startLocationUpdate();
+    Recipe recipe{
+        kSearch,         TavrinURLRequestBuilder::requestBuilderWithURL(*url), &request, &bag, userGuid, fieldMask,
+        bag.userAgent()};
+    recipe.timeout = timeout;
+    recipe.builder.forceQueryItemWithName("q", request.queryString);
+    if (isSuggested(request)) recipe.builder.forceQueryItemWithName("qtype", "suggested");
+    return build(recipe);
+}
+
+TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::zeroKeywordRequest(const TAVRequest& request,
+                                                                               const TAVBag& bag, const Uuid& userGuid,
+                                                                               std::uint64_t fieldMask,
+                                                                               std::optional<Duration> timeout)
+{
+    const auto url = bag.searchURL();
+    if (!url) return std::nullopt;
+    _startLocationUpdate();
+    Recipe recipe{
+        kZeroKeyword,    TavrinURLRequestBuilder::requestBuilderWithURL(*url), &request, &bag, userGuid, fieldMask,
+        bag.userAgent()};
+    recipe.timeout = timeout;
+    recipe.builder.forceQueryItemWithName("qtype", "zkw");
+    return build(recipe);
+}
+
+TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::moreResultsRequest(const TAVMoreResultsRequest& request,
+                                                                               const TAVBag* bag, const Uuid& userGuid,
+                                                                               std::uint64_t fieldMask,
+                                                                               std::optional<Duration> timeout)
+{
+    if (!request.moreResultsURL) return std::nullopt;
+    Recipe recipe{kMoreResults,
+                  TavrinURLRequestBuilder::requestBuilderWithURL(*request.moreResultsURL),
+                  &request,
+                  bag,
+                  userGuid,
+                  fieldMask,
+                  bag ? bag->userAgent() : std::string()};
+    recipe.timeout = timeout;
+    if (!recipe.builder.containsQueryItemWithName("latlng")) _startLocationUpdate();
+    return build(recipe);
+}
+
+TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::lookupRequest(const TAVLookupRequest& request,
+                                                                          const TAVBag& bag, const Uuid& userGuid,
+                                                                          std::optional<Duration> timeout)
+{
+    const auto url = bag.searchURL();
+    if (!url) return std::nullopt;
+    _startLocationUpdate();
+    Recipe recipe{kLookup,         TavrinURLRequestBuilder::requestBuilderWithURL(*url), &request, &bag, userGuid, 0,
+                  bag.userAgent()};
+    recipe.timeout = timeout;
+    recipe.builder.forceQueryItemWithName("q", request.queryString);
+    return build(recipe);
+}
+
+TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::cardRequest(const TAVCardRequest& request,
+                                                                        const TAVBag& bag, const Uuid& userGuid,
+                                                                        std::optional<Duration> timeout)
+{
+    if (!request.cardURL) return std::nullopt;
+    Recipe recipe{
+        kCard,           TavrinURLRequestBuilder::requestBuilderWithURL(*request.cardURL), &request, &bag, userGuid, 0,
+        bag.userAgent()};
+    recipe.timeout = timeout;
+    return build(recipe);
+}
+
+TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::flightRequest(const TAVRequest& request, const TAVBag& bag,
+                                                                          const Uuid& userGuid,
+                                                                          std::optional<Duration> timeout)
+{
+    const auto url = bag.flightURL();
+    if (!url) return std::nullopt;
+    _startLocationUpdate();
+    Recipe recipe{kFlight,         TavrinURLRequestBuilder::requestBuilderWithURL(*url), &request, &bag, userGuid, 0,
+                  bag.userAgent()};
+    recipe.timeout = timeout;
+    recipe.builder.forceQueryItemWithName("q", request.queryString);
+    return build(recipe);
+}
+
+UrlRequest TAVNetworkRequestFactory::fileDownloadRequest(const Url& url, const std::string& version,
+                                                         bool includeLatLong)
+{
+    Recipe recipe{.kind = kDownload, .builder = TavrinURLRequestBuilder::requestBuilderWithURL(url)};
+    recipe.userAgent = kDownloadUserAgent;
+    recipe.version = version;
+    recipe.includeLatLong = includeLatLong;
+    return build(recipe);
+}
+
+UrlRequest TAVNetworkRequestFactory::flusherUploadRequest(const Url& url, Duration timeout, const std::string& digest)
+{
+    Recipe recipe{.kind = kUpload, .builder = TavrinURLRequestBuilder::requestBuilderWithURL(url)};
+    recipe.userAgent = ClientSessionManager::tavrindUserAgent();
+    recipe.digest = digest;
+    recipe.timeout = timeout;
+    UrlRequest request = build(recipe);
+    request.method = "POST";
+    request.headers.set("Content-Encoding", "deflate");
+    return request;
+}
+
+UrlRequest TAVNetworkRequestFactory::warmRequest(const Url& url)
+{
+    UrlRequest request = TavrinURLRequestBuilder::requestBuilderWithURL(url).createMutableUrlRequest();
+    request.cachePolicy = UrlRequest::CachePolicy::ReloadIgnoringCache;
+    return request;
+}
+
+void TAVNetworkRequestFactory::setPerformedSearch()
+{
+    _contextAccessQueue->barrierAsync([self = shared_from_this()] {
+        if (self->_currentLocation) self->_context.lookupGeoLocationLatLng = self->_context.geoLocationLatLng;
+    });
+}
+
+std::optional<std::string> TAVNetworkRequestFactory::getMapsUserSessionEntity()
+{
+    std::string entity = _contextAccessQueue->sync([this] { return _context.geoSessionEntity; });
+    return entity.empty() ? std::nullopt : std::optional(std::move(entity));
+}
+
+std::string TAVNetworkRequestFactory::_deviceCountryCode()
+{
+    return _contextAccessQueue->sync([this] { return _context.geoDeviceCountryCode; });
+}
+
+RequestContext TAVNetworkRequestFactory::context()
+{
+    return _contextAccessQueue->sync([this] { return _context; });
+}
+
+void TAVNetworkRequestFactory::_setUpDebuggingQueryItems()
+{
+    const auto parameters = _assembly.userDefaults.string("TAVDebugParameters");
+    if (!parameters) return;
+    log().log("processing debug parameters: ({})", *parameters);
+    std::string_view rest = *parameters;
+    while (!rest.empty()) {
+        const std::string_view piece = rest.substr(0, rest.find('&'));
+        rest.remove_prefix(std::min(piece.size() + 1, rest.size()));
+        const std::size_t equals = piece.find('=');
+        const bool valid = equals != std::string_view::npos && equals > 0 && equals + 1 < piece.size() &&
+                           piece.find('=', equals + 1) == std::string_view::npos;
+        if (valid)
+            _context.debuggingQueryItems.emplace_back(std::string(piece.substr(0, equals)),
+                                                      std::string(piece.substr(equals + 1)));
+        else
+            log().error("invalid query components: {}", piece);
+    }
+}
+
+void TAVNetworkRequestFactory::_updateLocale()
+{
+    const platform::LocaleContext locale = _assembly.device.locale.locale();
+    _context.localeIdentifier = locale.identifier;
+    _context.effectiveSystemLanguage = locale.systemLanguage;
+    _context.localeCalendarIdentifier = locale.calendar;
+    _context.is24hDateFormat = locale.is24Hour ? "1" : "";
+    _context.localeMeasurementSystem = locale.measurementSystem;
+    Value::Array languages;
+    bool encodable = true;
+    for (const std::string& language : locale.preferredLanguages) {
+        for (unsigned char c : language) encodable = encodable && c > 0x20 && c < 0x7f;
+        languages.emplace_back(language);
+    }
+    _context.preferredLanguages = encodable && !languages.empty() ? platform::toJson(languages) : "";
+    if (!encodable) log().error("Error encoding preferred languages {}.", platform::toJson(languages));
+}
+
+void TAVNetworkRequestFactory::_updateTimeZone()
+{
+    _context.localTimeZoneName = _assembly.device.locale.timeZone();
+}
+
+void TAVNetworkRequestFactory::_updateProfile(const platform::DeviceProfile& profile)
+{
+    _context.geoDeviceCountryCode = profile.countryCode.value_or(_assembly.device.locale.locale().region);
+    _context.storeFrontIdentifier = profile.storefront.value_or("");
+    _context.isManagedAccount = profile.managedAccount;
+    _context.geoClientMetadata = profile.geoMetadata.value_or("");
+    _context.geoEnvironment = profile.geoEnvironment.value_or("");
+    _context.geoSessionId = profile.geoSessionId.value_or("");
+    _context.geoSessionEntity = profile.geoSessionEntity.value_or("");
+    if (_context.geoSessionId.empty() && !_context.geoSessionEntity.empty())
+        log().error("GEOUserSessionEntity does not respond to selector sessionIDString, actual class is {}",
+                    "geoSession");
+}
+
+void TAVNetworkRequestFactory::_updateLocation(const std::optional<platform::Location>& location,
+                                               const std::string& reason)
+{
+    if (!location || !_supportedGeoLocationSources.contains(location->source)) return _setNoLocationWithReason(reason);
+    _currentLocation = location;
+    _context.geoLocationLatLng = fmt::format("{:f},{:f}", location->latitude, location->longitude);
+    _context.geoLocationSource = location->source;
+}
+
+void TAVNetworkRequestFactory::_setNoLocationWithReason(const std::string& reason)
+{
+    log().info("no location: {}", reason);
+    _currentLocation.reset();
+    _context.geoLocationLatLng.clear();
+    _context.geoLocationSource.clear();
+    _context.lookupGeoLocationLatLng.clear();
+}
+
+void TAVNetworkRequestFactory::_startLocationUpdate()
+{
+    _assembly.device.location.requestUpdate();
+}
+
+void TAVNetworkRequestFactory::_notifyBagRefreshRequired()
+{
+    _assembly.device.mainQueue()->async([weak = weak_from_this()] {
+        if (auto self = weak.lock())
+            self->_assembly.notificationCenter.post({.name = TAVBagRefreshRequired, .object = self.get()});
+    });
+}
+
+void TAVNetworkRequestFactory::bagChangeNotification(const std::shared_ptr<const TAVBag>& bag)
+{
+    const auto list = bag->supportedGeoLocationSources();
+    _contextAccessQueue->barrierAsync(
+        [self = shared_from_this(), sources = std::set<std::string>(list.begin(), list.end())] {
+            const bool changed = !self->_locationServicesSetUp || sources != self->_supportedGeoLocationSources;
+            self->_locationServicesSetUp = true;
+            self->_supportedGeoLocationSources = sources;
+            if (changed) self->_assembly.device.location.setAllowedSources(sources);
+            if (!sources.contains(self->_context.geoLocationSource) && self->_currentLocation)
+                self->_setNoLocationWithReason("the bag no longer allows its source");
+        });
+    if (const auto visible = bag->hashtagImagesVisible()) {
+        _assembly.device.globalQueue(platform::Priority::Background)->async([self = shared_from_this(), visible] {
+            platform::UserDefaults& defaults = self->_assembly.userDefaults;
+            if (defaults.value("TAVHashtagImagesVisible").asBool() != visible)
+                defaults.set("TAVHashtagImagesVisible", *visible);
+        });
+    }
+}
+
+void TAVNetworkRequestFactory::guuidChangeNotification()
+{
+    _contextAccessQueue->barrierAsync([self = shared_from_this()] {
+        if (const auto& controller = self->_assembly.guidController)
+            self->_context.userGuid = controller->currentUserGUID();
+    });
+}
+
+void TAVNetworkRequestFactory::didUpdateStorefrontIdentifier(const std::optional<std::string>& storefront)
+{
+    _contextAccessQueue->barrierAsync(
+        [self = shared_from_this(), storefront] { self->_context.storeFrontIdentifier = storefront.value_or(""); });
+}
+
+void TAVNetworkRequestFactory::didUpdateSubscriptionDictionaries(const std::vector<Value>& subscriptions)
+{
+    std::string header = subscriptions.empty() ? "" : platform::toJson(Value::Array(subscriptions));
+    _contextAccessQueue->barrierAsync(
+        [self = shared_from_this(), header = std::move(header)] { self->_context.subscriptionInfo = header; });
+}
+
+} // namespace tavrin

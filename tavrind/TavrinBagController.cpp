@@ -1,0 +1,361 @@
+#include "tavrind/TavrinBagController.h"
+
+#include <algorithm>
+#include <cctype>
+
+#include <fmt/format.h>
+
+#include "CoreTavrin/TAVBag.h"
+#include "CoreTavrin/TAVError.h"
+#include "platform/Clock.h"
+#include "platform/Device.h"
+#include "platform/Transactions.h"
+#include "platform/UserDefaults.h"
+#include "searchrecords/ZRErrorFeedback.h"
+#include "searchrecords/ZRNetworkFeedback.h"
+#include "tavrind/Assembly.h"
+#include "tavrind/ClientSession.h"
+#include "tavrind/ClientSessionManager.h"
+#include "tavrind/FeedbackRecords.h"
+#include "tavrind/Flags.h"
+#include "tavrind/TAVNetworkRequestFactory.h"
+#include "tavrind/TAVRetryableNetworkRequest.h"
+#include "tavrind/TavrinFeedback.h"
+#include "tavrind/TavrinLogging.h"
+#include "tavrind/TavrinUserGUIDController.h"
+
+namespace tavrin {
+
+using platform::Error;
+using platform::Url;
+using platform::Value;
+
+namespace {
+
+constexpr double kTrustedForSeconds = 14400;
+constexpr double kStaleAheadSeconds = 600;
+constexpr std::size_t kMaximumBagSize = 16u << 20;
+constexpr const char* kExpirationKey = "__expiration";
+constexpr const char* kBagUrlKey = "__bagurl";
+constexpr const char* kNewsUserAgent = "news/1.0";
+constexpr unsigned kFetchRetries = 5;
+
+const platform::Log& log()
+{
+    return TavrinLogForCategory(kLogBag);
+}
+
+} // namespace
+
+BagStaleness bagStaleness(std::optional<double> expiration, const std::string* cachedUrl, platform::Date now,
+                          const std::function<std::string()>& currentUrl)
+{
+    // A NaN compares false: such an expiration is stale too.
+    if (!(expiration.value_or(0) - platform::secondsSince1970(now) >= kStaleAheadSeconds)) return BagStaleness::Expired;
+    if (!cachedUrl) return BagStaleness::NoUrl;
+    return *cachedUrl == currentUrl() ? BagStaleness::Fresh : BagStaleness::UrlChanged;
+}
+
+bool versionPrecedes(std::string_view a, std::string_view b)
+{
+    const auto isDigit = [](char c) { return c >= '0' && c <= '9'; };
+    const auto takeNumber = [&](std::string_view& text) {
+        const std::size_t end = std::ranges::find_if_not(text, isDigit) - text.begin();
+        std::string_view number = text.substr(0, end);
+        text.remove_prefix(end);
+        number.remove_prefix(std::min(number.find_first_not_of('0'), number.size()));
+        return number;
+    };
+    while (!a.empty() && !b.empty()) {
+        if (isDigit(a.front()) && isDigit(b.front())) {
+            const std::string_view x = takeNumber(a);
+            const std::string_view y = takeNumber(b);
+            if (x.size() != y.size()) return x.size() < y.size();
+            if (x != y) return x < y;
+        } else {
+            if (a.front() != b.front()) return a.front() < b.front();
+            a.remove_prefix(1);
+            b.remove_prefix(1);
+        }
+    }
+    return a.size() < b.size();
+}
+
+/// One fetch, from its request to its completion.
+struct TavrinBagController::Fetch {
+    platform::Transactions::Token transaction; // keeps the process alive until the end
+    std::shared_ptr<ClientSession> session;
+    std::shared_ptr<ZRStartNetworkSearchFeedback> start;
+    std::string userGuid;
+    Value timingData;
+    Completion completion;
+};
+
+std::shared_ptr<TavrinBagController> TavrinBagController::make(Assembly& assembly)
+{
+    auto controller = std::make_shared<TavrinBagController>(assembly);
+    Value cached = controller->diskCachedBagDictionary();
+    if (!cached.isNull())
+        controller->cacheBagState(std::make_shared<const TAVBag>(std::move(cached), controller->_userAgent), true);
+    controller->_refreshObserver = assembly.notificationCenter.observe(
+        TAVBagRefreshRequired,
+        [weak = controller->weak_from_this()](const platform::Notification&) {
+            if (auto self = weak.lock()) self->_handleRefreshNotification();
+        },
+        assembly.requestFactory.get());
+    return controller;
+}
+
+TavrinBagController::TavrinBagController(Assembly& assembly)
+    : _assembly(assembly),
+      _inMemoryBagCacheAccessQueue(assembly.device.concurrentQueue("com.quorvane.tavrind.bagcontroller.cacheaccess")),
+      _userAgent(ClientSessionManager::tavrindUserAgent())
+{}
+
+TavrinBagController::~TavrinBagController() = default;
+
+Url TavrinBagController::bagFetchURLWithCountry(const std::string& country) const
+{
+    if (const auto configured = _assembly.userDefaults.string("TAVBagURL")) {
+        if (auto url = Url::parse(*configured); url && !url->host().empty()) return *url;
+        log().error("Malformed tavrin bag URL in user defaults key {}", "TAVBagURL");
+    }
+    const bool china = country.size() == 2 && std::toupper(static_cast<unsigned char>(country[0])) == 'C' &&
+                       std::toupper(static_cast<unsigned char>(country[1])) == 'N';
+    return Url::parse(china ? TAVRIND_BAG_URL_CN : TAVRIND_BAG_URL).value_or(Url());
+}
+
+std::shared_ptr<const TAVBag> TavrinBagController::inMemoryBag() const
+{
+    return _inMemoryBagCacheAccessQueue->sync([this] { return _inMemoryBag; });
+}
+
+std::shared_ptr<const TAVBag> TavrinBagController::currentBag()
+{
+    auto bag = cachedBagState();
+    if (!bag) _fetchBagStateWithVersion({});
+    return bag;
+}
+
+std::shared_ptr<const TAVBag> TavrinBagController::cachedBagState()
+{
+    auto bag = inMemoryBag();
+    if (bag && _isRefreshRequiredForCachedBag(bag->rawBag())) {
+        _assembly.device.globalQueue(platform::Priority::Default)->async([weak = weak_from_this()] {
+            if (auto self = weak.lock()) self->_fetchBagStateWithVersion({});
+        });
+    }
+    return bag;
+}
+
+std::optional<Url> TavrinBagController::warmURL()
+{
+    const auto bag = currentBag();
+    return bag ? bag->warmURL() : std::nullopt;
+}
+
+void TavrinBagController::forceFetchBag(const Value& announcement)
+{
+    const Value& announced = announcement["bag"];
+    const auto bag = inMemoryBag();
+    if (!bag || !announced.isNumber()) return;
+    const std::string version = platform::toJson(announced);
+    if (versionPrecedes(bag->version(), version)) _fetchBagStateWithVersion(version);
+}
+
+std::string TavrinBagController::_bagCacheURL()
+{
+    return _assembly.requestFactory->bagCacheRequest(*this, _userAgent, {}).url.string();
+}
+
+bool TavrinBagController::_isRefreshRequiredForCachedBag(const Value& rawBag)
+{
+    const std::optional<double> expiration = rawBag[kExpirationKey].asDouble();
+    const std::string* cachedUrl = rawBag[kBagUrlKey].asString();
+    const platform::Date now = _assembly.device.clock.wallNow();
+    std::string currentUrl;
+    switch (bagStaleness(expiration, cachedUrl, now, [&] { return currentUrl = _bagCacheURL(); })) {
+    case BagStaleness::Fresh: return false;
+    case BagStaleness::Expired:
+        log().log("bag expired: {:f}", expiration.value_or(0) - platform::secondsSince1970(now));
+        _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.bag.expired");
+        return true;
+    case BagStaleness::UrlChanged: log().log("bag url changed from: {} to {}", *cachedUrl, currentUrl); return true;
+    case BagStaleness::NoUrl: log().log("no bag URL found in cache"); return true;
+    }
+    return true;
+}
+
+platform::Result<std::string> TavrinBagController::_pathToCachedBag()
+{
+    const auto& caches = _assembly.device.directories.caches;
+    if (auto made = _assembly.fileManager.createDirectories(caches); !made) {
+        log().error("error getting cache directory {}", made.error().description());
+        return std::unexpected(made.error());
+    }
+    const auto directory = caches / "com.quorvane.tavrind";
+    if (auto made = _assembly.fileManager.createDirectories(directory); !made) {
+        log().error("error creating agent-specific cache directory {}", made.error().description());
+        return std::unexpected(made.error());
+    }
+    return (directory / "bag.plist").string();
+}
+
+Value TavrinBagController::diskCachedBagDictionary()
+{
+    if (!Flags::diskBagCacheEnabled()) {
+        log().log("skipping check for bag on disk because the flag is disabled");
+        return {};
+    }
+    const auto path = _pathToCachedBag();
+    if (!path) return {};
+    const auto bytes = _assembly.fileManager.read(*path, kMaximumBagSize);
+    if (!bytes && bytes.error().domain == platform::kPosixErrorDomain && bytes.error().code == ENOENT) return {};
+    auto bag = bytes ? platform::parsePropertyList(bytes->view(), kMaximumBagSize) : std::unexpected(bytes.error());
+    if (!bag) {
+        log().fault("Error reading from bag cache: {}.", bag.error().description());
+        return {};
+    }
+    if (!bag->asDictionary()) {
+        log().log("Unexpected class deserialized from bag cache: {}.", platform::typeName(bag->type()));
+        return {};
+    }
+    if (_isRefreshRequiredForCachedBag(*bag)) _fetchBagStateWithVersion({});
+    return std::move(*bag);
+}
+
+Value TavrinBagController::_dictionaryToCacheBag(const Value& fetched)
+{
+    Value bag = fetched;
+    platform::Dictionary& entries = bag.mutableDictionary();
+    entries.set(kExpirationKey, platform::secondsSince1970(_assembly.device.clock.wallNow()) + kTrustedForSeconds);
+    entries.set(kBagUrlKey, _bagCacheURL());
+    return bag;
+}
+
+Value TavrinBagController::cacheBagDictionary(const Value& fetched)
+{
+    Value bag = _dictionaryToCacheBag(fetched);
+    if (!Flags::diskBagCacheEnabled()) {
+        log().log("skipping writing bag to disk because the flag is disabled");
+        return bag;
+    }
+    const auto path = _pathToCachedBag();
+    if (!path) {
+        log().error("Couldn't get path to cache bag.  Error: {}.", path.error().description());
+        return bag;
+    }
+    const auto list = platform::toPropertyList(bag);
+    if (!list)
+        log().error("Error writing bag to persistent cache: {}.", list.error().description());
+    else if (auto written = _assembly.fileManager.writeAtomically(*path, *list); !written)
+        log().error("Could not write to {}: {}", *path, written.error().description());
+    return bag;
+}
+
+void TavrinBagController::cacheBagState(std::shared_ptr<const TAVBag> bag, bool fromDisk)
+{
+    if (!bag) return;
+    for (const std::string& problem : bag->problems()) log().error("bag: {}; the default is used", problem);
+    enum : unsigned long { kDisabled, kEnabled, kUnknown };
+    const auto newsState = [](const TAVBag* some) -> unsigned long {
+        return !some ? kUnknown : TAVBag(some->rawBag(), kNewsUserAgent).isEnabled() ? kEnabled : kDisabled;
+    };
+    _inMemoryBagCacheAccessQueue->barrierSync([&] {
+        const unsigned long before = newsState(_inMemoryBag.get());
+        const unsigned long after = newsState(bag.get());
+        _inMemoryBag = bag;
+        _assembly.notificationCenter.post({.name = TAVBagChangeNotification, .userInfo = {{"bag", bag}}});
+        if (before != after && !fromDisk) {
+            log().log("setting Tavrin News Available status to {}", after);
+            _assembly.device.systemNotifier.post(after == kEnabled ? kNewsEnabledNotifyName : kNewsDisabledNotifyName);
+        }
+    });
+}
+
+void TavrinBagController::_fetchBagStateWithVersion(const std::string& version)
+{
+    if (_fetchInProgress.exchange(true)) return;
+    _fetchBagStateWithVersion(version, nullptr);
+}
+
+void TavrinBagController::_fetchBagStateWithVersion(const std::string& version, Completion completion)
+{
+    const platform::UrlRequest request = _assembly.requestFactory->bagFetchRequest(*this, _userAgent, version);
+    log().debug("Initiating bag fetch attempt with request {} header {}", request.url.string(),
+                describe(request.headers));
+
+    auto fetch = std::make_shared<Fetch>();
+    fetch->transaction = _assembly.device.transactions.begin("bagFetch");
+    fetch->completion = std::move(completion);
+    fetch->start = startNetworkSearchFeedback("", request, StartSearchTrigger::Bag, EndpointType::TavrinBag);
+    if (_assembly.guidController) fetch->userGuid = _assembly.guidController->currentUserGUID().string();
+    fetch->session = std::make_shared<ClientSession>(
+        _assembly, std::make_shared<TavrinFeedback>(fetch->start, 0, fetch->userGuid, _userAgent));
+
+    auto task = dataTaskWithRetryableRequest(
+        _assembly.device, _assembly.urlSession, {.httpRequest = request, .expire = std::nullopt, .delayOnFail = true},
+        1, kFetchRetries, [weak = weak_from_this(), fetch](auto data, auto response, auto error, Value timingData) {
+            auto self = weak.lock();
+            if (!self) {
+                log().log("Error fetching bag, bag fetch task completed after BagFetchController was cleaned up");
+                return;
+            }
+            fetch->timingData = std::move(timingData);
+            self->_fetchCompleted(*fetch, std::move(data), std::move(response), std::move(error));
+        });
+    task->resume();
+}
+
+void TavrinBagController::_fetchCompleted(Fetch& fetch, std::optional<platform::Bytes> data,
+                                          std::optional<platform::UrlResponse> response, std::optional<Error> error)
+{
+    const auto addFeedback = [&](std::shared_ptr<ZRFeedback> record) {
+        fetch.session->addFeedback(std::make_shared<TavrinFeedback>(std::move(record), 0, fetch.userGuid, _userAgent));
+    };
+    const int statusCode = response ? response->statusCode : 0;
+    log().log("resp: {}", statusCode);
+    addFeedback(std::make_shared<ZREndNetworkSearchFeedback>(fetch.start, data ? data->size() : 0, statusCode,
+                                                             std::move(fetch.timingData)));
+
+    std::shared_ptr<const TAVBag> bag;
+    if (error) {
+        log().error("Error fetching bag: {}", error->description());
+    } else if (!data) {
+        log().error("Error fetching bag: returned data was not of the expected type.");
+        error = makeTAVError(TAVErrorBagFetch, "no data");
+    } else if (statusCode != 200) {
+        log().error("Error fetching bag status code: {}", statusCode);
+        error = makeTAVError(TAVErrorBagFetch, fmt::format("statusCode {}", statusCode));
+    } else if (auto parsed = platform::parseJson(data->view(), kMaximumBagSize); !parsed) {
+        log().error("error parsing bag json {}", parsed.error().description());
+        error = parsed.error();
+    } else if (!parsed->asDictionary()) {
+        log().error("Error fetching bag: returned data was not of the expected type.");
+        error = makeTAVError(TAVErrorBagFetch, "not JSON object");
+    } else {
+        log().log("Got bag: {}", platform::toJson(*parsed));
+        bag = std::make_shared<const TAVBag>(cacheBagDictionary(*parsed), _userAgent);
+        cacheBagState(bag, false);
+        _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.bag.fetches");
+    }
+
+    if (error) {
+        addFeedback(std::make_shared<ZRErrorFeedback>(*error));
+        _assembly.notificationCenter.post({.name = TAVBagChangeNotification, .userInfo = {{"bagError", *error}}});
+        _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.bag.fetchesfailed");
+    }
+    fetch.session->sessionComplete();
+    if (fetch.completion) fetch.completion(bag, error);
+    _fetchInProgress = false;
+    fetch.transaction = {};
+}
+
+void TavrinBagController::_handleRefreshNotification()
+{
+    log().debug("something significant changed (locale, geo). checking to see if bag needs update");
+    const auto bag = inMemoryBag();
+    if (_isRefreshRequiredForCachedBag(bag ? bag->rawBag() : Value())) _fetchBagStateWithVersion({});
+}
+
+} // namespace tavrin

@@ -1,0 +1,104 @@
+#pragma once
+
+#include <atomic>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "platform/Error.h"
+#include "platform/NotificationCenter.h"
+#include "platform/Url.h"
+
+namespace platform {
+class Queue;
+struct UrlResponse;
+} // namespace platform
+
+namespace tavrin {
+
+struct Assembly;
+class ClientSession;
+class TAVBag;
+struct ZRStartNetworkSearchFeedback;
+
+/// Posted, without an object, when a bag is installed ("bag": shared_ptr<const TAVBag>) and when a fetch failed
+/// ("bagError": platform::Error). It is posted inside the controller's barrier: observers hand their work on and don't
+/// read the controller.
+inline constexpr const char* TAVBagChangeNotification = "TAVBagChangeNotification";
+/// Posted by the request factory when something changed that the bag depends on.
+inline constexpr const char* TAVBagRefreshRequired = "TAVBagRefreshRequired";
+
+/// System-wide names that tell other processes whether the news client may use the service.
+inline constexpr const char* kNewsEnabledNotifyName = "com.quorvane.tavrin.news.enabled";
+inline constexpr const char* kNewsDisabledNotifyName = "com.quorvane.tavrin.news.disabled";
+
+/// Why a cached bag must be fetched again.
+enum class BagStaleness { Fresh, Expired, NoUrl, UrlChanged };
+
+/// `expiration`: the moment the bag stops being trusted, none counts as 1970; it is stale 600 s before. `cachedUrl`:
+/// what the bag cache request's URL was when the bag was fetched; `currentUrl` makes it anew, and is called only if it
+/// counts.
+[[nodiscard]] BagStaleness bagStaleness(std::optional<double> expiration, const std::string* cachedUrl,
+                                        platform::Date now, const std::function<std::string()>& currentUrl);
+
+/// Orders version texts with runs of digits compared as numbers: "9" before "10".
+[[nodiscard]] bool versionPrecedes(std::string_view a, std::string_view b);
+
+/// Fetches the bag, keeps one copy in memory and one on disk, and tells the daemon when there is a new one.
+///
+/// Life: the copy on disk, stale or not, is there from the start. A bag is stale 3 h 50 min after its fetch, or when
+/// the URL that it was fetched from would be another now; whoever reads a stale bag still gets it, and starts a fetch.
+/// One fetch runs at a time, further ones are dropped. A failed fetch leaves the bag as it was; there is no timer, the
+/// next reading tries again.
+///
+/// Any thread.
+class TavrinBagController : public std::enable_shared_from_this<TavrinBagController> {
+public:
+    /// Reads the disk cache, and observes TAVBagRefreshRequired of the assembly's request factory.
+    static std::shared_ptr<TavrinBagController> make(Assembly& assembly);
+    explicit TavrinBagController(Assembly& assembly);
+    ~TavrinBagController();
+
+    /// Where a device in `country` fetches its bag.
+    [[nodiscard]] platform::Url bagFetchURLWithCountry(const std::string& country) const;
+
+    /// The bag; none starts a fetch.
+    [[nodiscard]] std::shared_ptr<const TAVBag> currentBag();
+    /// The bag, stale or not; a stale one starts a fetch soon.
+    [[nodiscard]] std::shared_ptr<const TAVBag> cachedBagState();
+    /// The bag as it is; starts nothing.
+    [[nodiscard]] std::shared_ptr<const TAVBag> inMemoryBag() const;
+    [[nodiscard]] std::optional<platform::Url> warmURL();
+
+    /// The service announces a bag version, a number under "bag": fetched if the bag at hand precedes it.
+    void forceFetchBag(const platform::Value& announcement);
+
+    [[nodiscard]] bool fetchInProgress() const { return _fetchInProgress; }
+
+private:
+    using Completion = std::move_only_function<void(std::shared_ptr<const TAVBag>, std::optional<platform::Error>)>;
+    struct Fetch;
+
+    [[nodiscard]] platform::Value diskCachedBagDictionary();
+    [[nodiscard]] platform::Value cacheBagDictionary(const platform::Value& fetched);
+    void cacheBagState(std::shared_ptr<const TAVBag> bag, bool fromDisk);
+    [[nodiscard]] platform::Result<std::string> _pathToCachedBag();
+    [[nodiscard]] platform::Value _dictionaryToCacheBag(const platform::Value& fetched);
+    [[nodiscard]] bool _isRefreshRequiredForCachedBag(const platform::Value& rawBag);
+    [[nodiscard]] std::string _bagCacheURL();
+    void _fetchBagStateWithVersion(const std::string& version);
+    void _fetchBagStateWithVersion(const std::string& version, Completion completion);
+    void _fetchCompleted(Fetch& fetch, std::optional<platform::Bytes> data,
+                         std::optional<platform::UrlResponse> response, std::optional<platform::Error> error);
+    void _handleRefreshNotification();
+
+    Assembly& _assembly;
+    std::shared_ptr<const TAVBag> _inMemoryBag; // on _inMemoryBagCacheAccessQueue
+    std::shared_ptr<platform::Queue> _inMemoryBagCacheAccessQueue;
+    std::string _userAgent;
+    std::atomic<bool> _fetchInProgress = false;
+    platform::NotificationCenter::Token _refreshObserver;
+};
+
+} // namespace tavrin

@@ -1,0 +1,52 @@
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "CoreTavrin/TAVProtocols.h"
+
+namespace platform {
+class ProcessIdentity;
+class Queue;
+} // namespace platform
+
+namespace tavrin {
+
+struct Assembly;
+class ClientConnection;
+
+/// Accepts the clients' connections and keeps one `ClientConnection` for each, from its acceptance until its session
+/// was flushed after its invalidation. Any thread.
+class TavrinService : public TAVDiagnosticsXPC, public std::enable_shared_from_this<TavrinService> {
+public:
+    /// Makes the assembly's GUID controller, session manager and flusher bridge too.
+    static std::shared_ptr<TavrinService> make(Assembly& assembly);
+    explicit TavrinService(Assembly& assembly);
+    ~TavrinService() override;
+
+    /// Takes a new connection; always accepts. Run loop's thread.
+    void listenerShouldAcceptNewConnection(std::shared_ptr<platform::ipc::Connection> connection);
+
+    /// A snapshot.
+    [[nodiscard]] std::vector<std::shared_ptr<ClientConnection>> getClientConnections() const;
+
+    /// The peer's application id, else the last part of its executable's path; none for a process that isn't there.
+    [[nodiscard]] static std::optional<std::string> clientIDForConnection(platform::ProcessIdentity& processes,
+                                                                          pid_t pid);
+
+    platform::Value status() override;
+    std::string statistics() override;
+
+private:
+    void _connectionInvalidated(const std::shared_ptr<ClientConnection>& connection, const std::string& clientId,
+                                pid_t pid);
+
+    Assembly& _assembly;
+    platform::Date _started;
+    std::shared_ptr<platform::Queue> _queue;
+    std::vector<std::shared_ptr<ClientConnection>> _connections; // on _queue
+};
+
+} // namespace tavrin
