@@ -1,0 +1,346 @@
+#include "tavrind/ClientConnection.h"
+
+#include <algorithm>
+#include <array>
+
+#include "CoreTavrin/TAVBag.h"
+#include "CoreTavrin/TAVError.h"
+#include "CoreTavrin/TAVRequest.h"
+#include "CoreTavrin/TAVSessionConfiguration.h"
+#include "platform/Clock.h"
+#include "platform/Device.h"
+#include "platform/DeviceProfile.h"
+#include "platform/LocaleSource.h"
+#include "searchrecords/ZRRecords.h"
+#include "tavrind/Assembly.h"
+#include "tavrind/ClientSession.h"
+#include "tavrind/ClientSessionManager.h"
+#include "tavrind/ClientState.h"
+#include "tavrind/ClientStateManager.h"
+#include "tavrind/DownloadManager.h"
+#include "tavrind/TavrinBagController.h"
+#include "tavrind/TavrinFeedback.h"
+#include "tavrind/TavrinFeedbackFlusher.h"
+#include "tavrind/TavrinFlusherXPC.h"
+#include "tavrind/TavrinLogging.h"
+#include "tavrind/TAVTracing.h"
+
+namespace tavrin {
+
+namespace {
+
+// A record is about the query of its first result.
+std::uint64_t queryIdOf(const std::shared_ptr<ZRSearchResult>& result)
+{
+    return result ? result->queryId : 0;
+}
+std::uint64_t queryIdOf(const std::vector<std::shared_ptr<ZRSearchResult>>& results)
+{
+    return results.empty() ? 0 : queryIdOf(results.front());
+}
+std::uint64_t queryIdOf(const std::shared_ptr<ZRResultSection>& section)
+{
+    return section ? queryIdOf(section->results) : 0;
+}
+std::uint64_t queryIdOf(const std::vector<std::shared_ptr<ZRResultSection>>& sections)
+{
+    return sections.empty() ? 0 : queryIdOf(sections.front());
+}
+
+/// Wraps a reply so that its answer is also a trace point.
+RequestReply traced(RequestReply reply, TAVTraceCode answer)
+{
+    auto shared = std::make_shared<RequestReply>(std::move(reply));
+    return RequestReply(
+        [shared, answer](std::int64_t queryId, std::shared_ptr<TAVReply> record, OptionalError error) {
+            TAVTrace(answer, static_cast<std::uint64_t>(queryId));
+            (*shared)(queryId, std::move(record), std::move(error));
+        },
+        [shared] { shared->abandon(); });
+}
+
+} // namespace
+
+std::uint64_t clientQueryIdOf(const ZRFeedback& feedback)
+{
+    if (const auto* f = dynamic_cast<const ZRStartSearchFeedback*>(&feedback)) return f->queryId;
+    if (const auto* f = dynamic_cast<const ZRRankingFeedback*>(&feedback))
+        return f->sections.empty() || !f->sections.front() ? 0 : queryIdOf(f->sections.front()->section);
+    if (const auto* f = dynamic_cast<const ZRLateSectionsAppendedFeedback*>(&feedback)) return queryIdOf(f->sections);
+    if (const auto* f = dynamic_cast<const ZRResultEngagementFeedback*>(&feedback)) return queryIdOf(f->result);
+    if (const auto* f = dynamic_cast<const ZRVisibleResultsFeedback*>(&feedback)) return queryIdOf(f->results);
+    if (const auto* f = dynamic_cast<const ZRResultsReceivedAfterTimeoutFeedback*>(&feedback))
+        return queryIdOf(f->results);
+    if (const auto* f = dynamic_cast<const ZRSectionEngagementFeedback*>(&feedback)) return queryIdOf(f->section);
+    if (const auto* f = dynamic_cast<const ZRVisibleSectionHeaderFeedback*>(&feedback)) return queryIdOf(f->section);
+    return 0;
+}
+
+ClientConnection::ClientConnection(Assembly& assembly, std::shared_ptr<TAVClientXPC> remoteObject,
+                                   std::shared_ptr<platform::ipc::Connection> connection)
+    : _assembly(assembly), _clientStateManager(assembly.clientStateManager), _remoteObject(std::move(remoteObject)),
+      _connection(std::move(connection)), _flusherListener(assembly.flusherXPCListener)
+{}
+
+ClientConnection::~ClientConnection() = default;
+
+std::string ClientConnection::_userAgent() const
+{
+    return _configuration ? _configuration->userAgent.value_or("") : "";
+}
+
+std::optional<std::string> ClientConnection::clientShortName() const
+{
+    return _state ? _state->clientShortName() : std::nullopt;
+}
+
+void ClientConnection::_ensureState()
+{
+    const platform::Log& log = TavrinLogForCategory(kLogSession);
+    if (!_configuration) return log.fault("configuration must not be nil");
+    if (_configuration->identifier.value_or("").empty() || _configuration->userAgent.value_or("").empty())
+        return log.fault("configuration requires identifier and agent");
+    if (_state) {
+        if (_state->identifier() != *_configuration->identifier) log.fault("session identifier must match");
+        return;
+    }
+    if (auto state = _clientStateManager->stateForClientIdentifier(_configuration->identifier)) {
+        state->setConfiguration(_configuration);
+        _state = std::move(state);
+    }
+}
+
+void ClientConnection::configure(std::shared_ptr<TAVSessionConfiguration> configuration,
+                                 platform::Reply<std::string> reply)
+{
+    TavrinLogForCategory(kLogConnection)
+        .log("client configuration {}", configuration ? platform::toJson(platform::toValue(*configuration)) : "none");
+    _configuration = std::move(configuration);
+    _ensureState();
+    if (!_state) {
+        ClientSessionManager::reportErrorAsTavrindFeedback(
+            makeTAVError(TAVErrorInvalidResponse, "invalid configuration"), _assembly);
+        TavrinLogForCategory(kLogSession).fault("invalid configuration, closing connection");
+        _connection->invalidate();
+        return reply.abandon();
+    }
+
+    const std::string userAgent = _userAgent();
+    _state->bag(
+        userAgent,
+        BagReply([weak = weak_from_this(), userAgent](std::shared_ptr<const TAVBag> bag, const OptionalError& error) {
+            auto self = weak.lock();
+            if (!self) return;
+            if (bag && !bag->feedbackEnabled())
+                TavrinLogForCategory(kLogFeedback)
+                    .info("feedback collection disabled in bag for user agent {}", userAgent);
+            TavrinLogForCategory(kLogBag).info("sending bag with version: {} to client: {} error: {}",
+                                               bag ? bag->version() : "none", userAgent,
+                                               error ? error->description() : "none");
+            self->_remoteObject->bagDidLoad(bag, error);
+            self->_bagObserver = self->_assembly.notificationCenter.observe(
+                TAVBagChangeNotification, [weak](const platform::Notification& notification) {
+                    if (auto connection = weak.lock())
+                        connection->bagChangeNotification(notification.get<std::shared_ptr<const TAVBag>>("bag"));
+                });
+            // One may have come in between, too late for the answer and too early for the observer.
+            if (!bag)
+                if (auto late = self->_state->bag()) self->_remoteObject->bagDidLoad(late, {});
+            self->_clientStateManager->saveState();
+        }));
+    reply(_clientStateManager->endpoint());
+}
+
+void ClientConnection::bagChangeNotification(const std::shared_ptr<const TAVBag>& bag)
+{
+    TavrinLogForCategory(kLogBag).info("bag change notification: {}", bag ? bag->version() : "none");
+    if (bag) _remoteObject->bagDidLoad(bag, {});
+}
+
+void ClientConnection::bag(BagReply reply)
+{
+    _ensureState();
+    if (!_state) return reply(nullptr, makeTAVError(TAVErrorInvalidResponse, "client state nil"));
+    _state->bag(_userAgent(), std::move(reply));
+}
+
+void ClientConnection::_completeDefaults(TAVRequest& request) const
+{
+    const platform::Log& log = TavrinLogForCategory(kLogRequest);
+    if (request.keyboardInputMode.value_or("").empty()) {
+        std::string mode = _assembly.device.locale.keyboardInputMode();
+        if (mode.empty()) mode = _assembly.device.locale.defaultInputMode();
+        log.error("keyboardInputMode property not set, using {}", mode);
+        request.keyboardInputMode = std::move(mode);
+    }
+    if (request.scale == 0.0) {
+        request.scale = _assembly.device.profile.profile().screenScale;
+        log.error("request scale property not set, using {:f}", request.scale);
+    }
+}
+
+void ClientConnection::request(std::shared_ptr<TAVRequest> request, RequestReply reply)
+{
+    _ensureState();
+    if (!_state) return reply(request->queryId, nullptr, makeTAVError(TAVErrorInvalidResponse, "client state nil"));
+    _completeDefaults(*request);
+
+    const auto queryId = static_cast<std::uint64_t>(request->queryId);
+    if (auto query = std::dynamic_pointer_cast<TAVSearchRequest>(request)) {
+        search(std::move(query), std::move(reply));
+    } else if (auto more = std::dynamic_pointer_cast<TAVMoreResultsRequest>(request)) {
+        _state->moreResults(std::move(more), std::move(reply));
+    } else if (auto card = std::dynamic_pointer_cast<TAVCardRequest>(request)) {
+        TAVTrace(kTraceCardStart, queryId);
+        _state->card(std::move(card), traced(std::move(reply), kTraceCardAnswer));
+    } else if (auto zkw = std::dynamic_pointer_cast<TAVZeroKeywordRequest>(request)) {
+        TAVTrace(kTraceZeroKeywordStart, queryId);
+        _state->zeroKeyword(std::move(zkw), traced(std::move(reply), kTraceZeroKeywordAnswer));
+    } else if (auto lookup = std::dynamic_pointer_cast<TAVLookupRequest>(request)) {
+        TAVTrace(kTraceLookupStart, queryId);
+        _state->lookup(std::move(lookup), traced(std::move(reply), kTraceLookupAnswer));
+    } else if (dynamic_cast<TAVFlightLookupRequest*>(request.get())) {
+        _state->flightLookup(std::move(request), std::move(reply));
+    } else if (dynamic_cast<TAVFlightSearchRequest*>(request.get())) {
+        _state->flightSearch(std::move(request), std::move(reply));
+    } else {
+        reply.abandon();
+    }
+}
+
+/// Only the newest query counts: one that is not above the highest id so far, and an answer that was overtaken, are
+/// answered empty.
+void ClientConnection::search(std::shared_ptr<TAVSearchRequest> request, RequestReply reply)
+{
+    const std::int64_t queryId = request->queryId;
+    TAVTrace(kTraceSearchStart, static_cast<std::uint64_t>(queryId));
+    RequestReply answer = traced(std::move(reply), kTraceSearchAnswer);
+
+    std::int64_t current = _currentQueryId;
+    if (queryId <= current || !_currentQueryId.compare_exchange_strong(current, queryId))
+        return answer(queryId, nullptr, {});
+
+    auto shared = std::make_shared<RequestReply>(std::move(answer));
+    _state->search(std::move(request),
+                   RequestReply([weak = weak_from_this(), queryId,
+                                 shared](std::int64_t, std::shared_ptr<TAVReply> record, OptionalError error) {
+                       auto self = weak.lock();
+                       if (!self) return shared->abandon();
+                       if (self->_currentQueryId > queryId) return (*shared)(queryId, nullptr, {});
+                       (*shared)(queryId, std::move(record), std::move(error));
+                   }));
+}
+
+void ClientConnection::_reportOneOff(const platform::Error& error) const
+{
+    ClientSession::createFeedbackSessionFromError(error, _assembly)->sessionComplete();
+}
+
+void ClientConnection::reportEvent(const std::string&, std::int64_t queryId, std::shared_ptr<ZRFeedback> feedback)
+{
+    if (feedback->timestamp == 0) feedback->timestamp = _assembly.device.clock.hostTicks();
+    reportEvent(std::move(feedback), queryId);
+}
+
+void ClientConnection::reportEvent(std::shared_ptr<ZRFeedback> feedback, std::int64_t queryId)
+{
+    const platform::Log& log = TavrinLogForCategory(kLogFeedback);
+    if (!_state) {
+        _reportOneOff(makeTAVError(TAVErrorInvalidResponse, "client state nil"));
+        return log.error("state must not be nil");
+    }
+    if (auto custom = std::dynamic_pointer_cast<ZRCustomFeedback>(feedback)) {
+        return handleCustomFeedback(std::move(custom), queryId,
+                                    [] { TavrinLogForCategory(kLogFlusher).log("flushed custom feedback"); });
+    }
+    if (const auto* appear = dynamic_cast<const ZRSearchViewAppearFeedback*>(feedback.get())) {
+        static constexpr std::array<std::int64_t, 9> kWarming{2, 5, 6, 9, 10, 11, 22, 23, 24};
+        if (!appear->isOnLockScreen &&
+            std::ranges::find(kWarming, static_cast<std::int64_t>(appear->viewAppearEvent)) != kWarming.end())
+            _state->warm();
+    }
+    const auto manager = _state->sessionManager();
+    if (!manager) {
+        _reportOneOff(makeTAVError(TAVErrorInvalidResponse, "session manager nil"));
+        return log.error("session manager nil");
+    }
+    const std::uint64_t clientQueryId = clientQueryIdOf(*feedback);
+
+    const auto& shortName = _state->clientShortName();
+    const auto* engagement = dynamic_cast<const ZRResultEngagementFeedback*>(feedback.get());
+    if (engagement && engagement->result && shortName) {
+        if (engagement->result->topHit != TopHit::No)
+            _assembly.diagnosticData.addValue(1, createCounterKey(*shortName, "tophit.engagements"));
+        if (engagement->result->type == ResultType::Tavrin)
+            _assembly.diagnosticData.addValue(1, createCounterKey(*shortName, "tavrin.engagements"));
+    }
+    manager->addTavrinFeedback(
+        std::make_shared<TavrinFeedback>(std::move(feedback), queryId, "", _userAgent(), clientQueryId));
+}
+
+void ClientConnection::handleCustomFeedback(std::shared_ptr<ZRCustomFeedback> feedback, std::int64_t queryId,
+                                            std::move_only_function<void()> callback)
+{
+    switch (static_cast<std::int64_t>(feedback->feedbackType)) {
+    case 1:
+    case 3:
+        ClientSession(_assembly, std::make_shared<TavrinFeedback>(std::move(feedback), queryId, "", _userAgent()))
+            .sessionComplete();
+        return callback();
+    case 2:
+        _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.dp.submit");
+        return _assembly.crowdsourcingFeedbackFlusher->flush(std::move(feedback), std::move(callback));
+    default:
+        TavrinLogForCategory(kLogFeedback)
+            .info("custom feedback of type {} is not served", static_cast<std::int64_t>(feedback->feedbackType));
+    }
+}
+
+void ClientConnection::feedback(const std::string&, platform::Reply<platform::Value::Array, OptionalError> reply)
+{
+    TAVTrace(kTraceFeedbackStart, 0);
+    _ensureState();
+    TAVTrace(kTraceFeedbackAnswer, 0);
+    if (!_state) return reply({}, makeTAVError(TAVErrorInvalidResponse, "client state nil"));
+    const auto manager = _state->sessionManager();
+    const auto session = manager ? manager->session() : nullptr;
+    reply(session ? session->feedbacksWithRelativeTimestamp() : platform::Value::Array(), {});
+}
+
+void ClientConnection::listenToFlusher(platform::Reply<std::string> reply)
+{
+    _ensureState();
+    reply(_flusherListener->endpoint());
+}
+
+void ClientConnection::listSessions(platform::Reply<platform::Value::Array> reply)
+{
+    _ensureState();
+    reply(_clientStateManager->sessions());
+}
+
+void ClientConnection::fileHandleAndAttributesForResource(const std::string& resource, ResourceReply reply)
+{
+    _ensureState();
+    auto found = _assembly.downloadManager->fileHandleForResource(resource);
+    if (found)
+        reply(std::move(found->file), std::move(found->attributes), {});
+    else
+        reply({}, {}, std::move(found.error()));
+}
+
+void ClientConnection::flushSession(std::move_only_function<void()> callback)
+{
+    const auto manager = _state ? _state->sessionManager() : nullptr;
+    if (!manager) return callback();
+    manager->flushSession(std::move(callback));
+}
+
+void ClientConnection::flushSessionInvalidation(std::move_only_function<void(bool)> callback)
+{
+    const auto manager = _state ? _state->sessionManager() : nullptr;
+    if (!manager) return callback(false);
+    manager->flushSessionInvalidation(_userAgent(), std::move(callback));
+}
+
+} // namespace tavrin

@@ -1,0 +1,141 @@
+#include "tavrind/ClientStateManager.h"
+
+#include <fmt/format.h>
+
+#include "CoreTavrin/TAVError.h"
+#include "CoreTavrin/TAVRequest.h"
+#include "CoreTavrin/TAVSessionConfiguration.h"
+#include "platform/Device.h"
+#include "platform/UserDefaults.h"
+#include "tavrind/Assembly.h"
+#include "tavrind/ClientState.h"
+#include "tavrind/TavrinLogging.h"
+
+namespace tavrin {
+
+using platform::Value;
+
+namespace {
+constexpr const char* kSessionsKey = "sessions";
+}
+
+std::shared_ptr<ClientStateManager> ClientStateManager::make(Assembly& assembly)
+{
+    auto manager = std::make_shared<ClientStateManager>(assembly);
+    manager->_listener->setAcceptor(
+        [weak = manager->weak_from_this()](std::shared_ptr<platform::ipc::Connection> connection) {
+            if (auto self = weak.lock()) self->_accept(std::move(connection));
+        });
+    manager->_listener->resume();
+    manager->loadState();
+    return manager;
+}
+
+ClientStateManager::ClientStateManager(Assembly& assembly)
+    : _assembly(assembly), _persistSessions(assembly.userDefaults.boolean("TAVPersistSessions")),
+      stateCacheQueue(assembly.device.serialQueue("com.quorvane.tavrind.stateCache")),
+      _imageHostsQueue(assembly.device.concurrentQueue("com.quorvane.tavrind.imageHostsQueue")),
+      _listener(assembly.device.ipc.anonymous(endpointInterface(), "com.quorvane.tavrind.endpoint"))
+{}
+
+ClientStateManager::~ClientStateManager() = default;
+
+std::shared_ptr<ClientState> ClientStateManager::stateForClientIdentifier(const std::optional<std::string>& identifier)
+{
+    const platform::Log& log = TavrinLogForCategory(kLogSession);
+    if (!identifier || identifier->empty()) {
+        log.fault("client session identifier cannot be nil or empty");
+        return nullptr;
+    }
+    auto state = stateCacheQueue->sync([&] {
+        std::shared_ptr<ClientState>& slot = stateCache[*identifier];
+        if (!slot) slot = std::make_shared<ClientState>(*identifier, _assembly);
+        return slot;
+    });
+    log.info("using client state: {}", *identifier);
+    return state;
+}
+
+std::string ClientStateManager::endpoint() const
+{
+    return _listener->endpoint();
+}
+
+Value::Array ClientStateManager::_sessions() const
+{
+    Value::Array sessions;
+    for (const auto& [identifier, state] : stateCache)
+        if (const auto agent = state->userAgent())
+            sessions.push_back(Value::dictionaryOf({{"identifier", identifier}, {"agent", *agent}}));
+    return sessions;
+}
+
+Value::Array ClientStateManager::sessions() const
+{
+    return stateCacheQueue->sync([this] { return _sessions(); });
+}
+
+void ClientStateManager::saveState()
+{
+    if (!_persistSessions) return;
+    stateCacheQueue->async([self = shared_from_this()] {
+        self->_assembly.userDefaults.set(kSessionsKey, self->_sessions());
+        self->_assembly.userDefaults.synchronize();
+    });
+}
+
+void ClientStateManager::loadState()
+{
+    if (!_persistSessions) return;
+    const Value stored = _assembly.userDefaults.value(kSessionsKey);
+    if (!stored.asArray()) return;
+    stateCacheQueue->sync([&] {
+        for (const Value& session : *stored.asArray()) {
+            const std::string* identifier = session["identifier"].asString();
+            if (!identifier || identifier->empty()) continue;
+            auto state = std::make_shared<ClientState>(*identifier, _assembly);
+            if (const std::string* agent = session["agent"].asString()) state->setUserAgent(*agent);
+            stateCache[*identifier] = std::move(state);
+        }
+    });
+}
+
+void ClientStateManager::_accept(std::shared_ptr<platform::ipc::Connection> connection)
+{
+    const platform::Log& log = TavrinLogForCategory(kLogConnection);
+    log.debug("new endpoint connection");
+    connection->exportObject(endpointHandler(weak_from_this()));
+    connection->setInvalidationHandler([&log] { log.debug("endpoint connection invalidated"); });
+    connection->resume();
+}
+
+void ClientStateManager::request(std::shared_ptr<TAVRequest> request,
+                                 std::shared_ptr<TAVSessionConfiguration> configuration, RequestReply reply)
+{
+    const auto state = configuration ? stateForClientIdentifier(configuration->identifier) : nullptr;
+    if (!state) {
+        const std::string description = configuration ? platform::toJson(platform::toValue(*configuration)) : "none";
+        return reply(request->queryId, nullptr,
+                     makeTAVError(TAVErrorInvalidResponse, fmt::format("invalid configuration {}", description)));
+    }
+    if (auto more = std::dynamic_pointer_cast<TAVMoreResultsRequest>(request))
+        state->moreResults(more, std::move(reply));
+    else if (auto card = std::dynamic_pointer_cast<TAVCardRequest>(request))
+        state->card(card, std::move(reply));
+    else
+        reply.abandon();
+}
+
+void ClientStateManager::processImagesFromResponse(const Value&, const std::shared_ptr<const TAVBag>&) {}
+
+std::set<std::string> ClientStateManager::validImageHosts() const
+{
+    return _imageHostsQueue->sync([this] { return _validImageHosts; });
+}
+
+void ClientStateManager::loadImages(Value::Array, std::uint64_t, platform::Reply<Value> reply)
+{
+    reply(Value(platform::Dictionary()));
+}
+
+} // namespace tavrin

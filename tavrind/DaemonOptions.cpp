@@ -1,0 +1,38 @@
+#include "tavrind/DaemonOptions.h"
+
+#include <cstdlib>
+#include <map>
+#include <string>
+
+#include <CLI/CLI.hpp>
+
+namespace tavrin {
+
+DaemonOptions parseDaemonOptions(int argc, char** argv)
+{
+    DaemonOptions options;
+    options.logToJournal = std::getenv("JOURNAL_STREAM") != nullptr; // set by systemd for its services
+
+    CLI::App app("The search daemon. It listens on $XDG_RUNTIME_DIR/com.quorvane.tavrind/socket, or on the socket that "
+                 "systemd passes, and runs until it is killed. Settings: tavrinctl defaults.");
+    app.set_version_flag("--version", "tavrind " TAVRIND_VERSION);
+    const std::map<std::string, platform::LogLevel> levels{{"debug", platform::LogLevel::Debug},
+                                                           {"info", platform::LogLevel::Info},
+                                                           {"default", platform::LogLevel::Default},
+                                                           {"error", platform::LogLevel::Error},
+                                                           {"fault", platform::LogLevel::Fault}};
+    app.add_option("--log-level", options.logLevel, "Lowest level that is logged (default: default)")
+        ->transform(CLI::CheckedTransformer(levels, CLI::ignore_case).description("{debug,info,default,error,fault}"));
+    std::string sink;
+    app.add_option("--log-to", sink, "Where the log goes (default: the journal under systemd, else stderr)")
+        ->check(CLI::IsMember({"stderr", "journal"}));
+    try {
+        app.parse(argc, argv);
+    } catch (const CLI::ParseError& error) {
+        std::exit(app.exit(error));
+    }
+    if (!sink.empty()) options.logToJournal = sink == "journal";
+    return options;
+}
+
+} // namespace tavrin

@@ -1,0 +1,101 @@
+#include "tavrind/Startup.h"
+
+#include <cstdlib>
+
+#include "CoreTavrin/TAVProtocols.h"
+#include "platform/Device.h"
+#include "platform/NotificationCenter.h"
+#include "platform/UrlSession.h"
+#include "platform/UserDefaults.h"
+#include "tavrind/AppWhitelistController.h"
+#include "tavrind/BackgroundActivitiesManager.h"
+#include "tavrind/ClientStateManager.h"
+#include "tavrind/DownloadManager.h"
+#include "tavrind/Lookup.h"
+#include "tavrind/TAVNetworkRequestFactory.h"
+#include "tavrind/TavrinBagController.h"
+#include "tavrind/TavrinDPAppDeepLinkIngester.h"
+#include "tavrind/TavrinFeedbackFlusher.h"
+#include "tavrind/TavrinPersistentStorage.h"
+#include "tavrind/TavrinService.h"
+#include "tavrind/TavrinSubscriptionManager.h"
+#include "tavrind/TAVTracing.h"
+
+namespace tavrin {
+
+namespace {
+
+using namespace std::chrono_literals;
+
+/// Certification authorities in place of the system's, for a service of one's own: the variable that OpenSSL reads.
+std::string caFile()
+{
+    const char* path = std::getenv("SSL_CERT_FILE");
+    return path ? path : "";
+}
+
+platform::UrlSessionConfiguration foregroundConfiguration(const platform::UserDefaults& userDefaults)
+{
+    return {.allowFastOpenAndTickets = !userDefaults.boolean("TAVNoParallax"),
+            .pipelining = true,
+            .connectionPurgeTimeout = 10s,
+            .caFile = caFile()};
+}
+
+} // namespace
+
+Daemon::Daemon(platform::Device& device) : assembly(device) {}
+Daemon::~Daemon() = default;
+
+platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device)
+{
+    TAVTracingSetup(device.userDefaults);
+    device.userDefaults.registerDefaults({{"TAVSharedSession", true},
+                                          {"TAVSessionSizeLimit", 4u << 20},    // bytes
+                                          {"TAVSessionMaxAge", 48 * 60 * 60}}); // seconds
+
+    auto daemon = std::make_unique<Daemon>(device);
+    Assembly& assembly = daemon->assembly;
+    const auto sessionQueue = [&](const char* label) { return device.concurrentQueue(label); };
+
+    assembly.urlSession = device.urlLoader.makeSession(foregroundConfiguration(device.userDefaults),
+                                                       sessionQueue("com.quorvane.tavrind.urlSession"));
+    assembly.requestFactory = TAVNetworkRequestFactory::make(assembly);
+    assembly.subscriptionManager = std::make_shared<TavrinSubscriptionManager>(assembly, assembly.requestFactory);
+    assembly.downloadManager = std::make_shared<DownloadManager>(assembly);
+    assembly.persistentStorage = std::make_shared<TavrinPersistentStorage>(assembly);
+    assembly.crowdsourcingFeedbackFlusher = std::make_shared<TavrinFeedbackFlusher>(assembly, 0);
+    assembly.backgroundFlusher = std::make_shared<BackgroundActivitiesManager>(assembly);
+    assembly.downloadURLSession =
+        device.urlLoader.makeSession({.caFile = caFile()}, sessionQueue("com.quorvane.tavrind.downloadSession"));
+    assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.launch");
+    assembly.bagSession = device.urlLoader.makeSession({.connectionPurgeTimeout = 10s, .caFile = caFile()},
+                                                       sessionQueue("com.quorvane.tavrind.bagSession"));
+    assembly.uploadURLSession = device.urlLoader.makeSession({.requestTimeout = 300s, .caFile = caFile()},
+                                                             sessionQueue("com.quorvane.tavrind.uploadSession"));
+    assembly.lookup = std::make_shared<Lookup>(assembly);
+    assembly.bagController = TavrinBagController::make(assembly);
+    assembly.clientStateManager = ClientStateManager::make(assembly);
+    assembly.appWhitelistController = std::make_shared<AppWhitelistController>(assembly);
+    daemon->deepLinkIngester = std::make_shared<TavrinDPAppDeepLinkIngester>(assembly);
+    daemon->deepLinkIngester->scheduleMaintenance();
+    daemon->service = TavrinService::make(assembly);
+
+    auto listener = device.ipc.listen(daemonInterface(), "com.quorvane.tavrind.connection");
+    if (!listener) return std::unexpected(std::move(listener.error()));
+    daemon->listener = std::move(*listener);
+    daemon->listener->setAcceptor([service = daemon->service](std::shared_ptr<platform::ipc::Connection> connection) {
+        service->listenerShouldAcceptNewConnection(std::move(connection));
+    });
+    daemon->listener->resume();
+
+    device.globalQueue(platform::Priority::Background)->async([bagController = assembly.bagController] {
+        (void)bagController->currentBag(); // only to start the first load
+    });
+    device.globalQueue(platform::Priority::Default)->async([&notifications = assembly.notificationCenter] {
+        notifications.post({.name = "TAVStartup"});
+    });
+    return daemon;
+}
+
+} // namespace tavrin

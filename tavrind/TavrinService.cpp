@@ -1,0 +1,152 @@
+#include "tavrind/TavrinService.h"
+
+#include <algorithm>
+#include <unistd.h>
+
+#include "CoreTavrin/TAVBag.h"
+#include "platform/Clock.h"
+#include "platform/Counters.h"
+#include "platform/Device.h"
+#include "platform/Process.h"
+#include "platform/Transactions.h"
+#include "platform/UserDefaults.h"
+#include "tavrind/Assembly.h"
+#include "tavrind/ClientConnection.h"
+#include "tavrind/ClientSessionManager.h"
+#include "tavrind/ClientStateManager.h"
+#include "tavrind/TavrinBagController.h"
+#include "tavrind/TavrinFlusherXPC.h"
+#include "tavrind/TavrinLogging.h"
+#include "tavrind/TavrinUserGUIDController.h"
+
+namespace tavrin {
+
+using platform::Value;
+namespace ipc = platform::ipc;
+
+namespace {
+
+const platform::Log& log()
+{
+    return TavrinLogForCategory(kLogConnection);
+}
+
+} // namespace
+
+std::shared_ptr<TavrinService> TavrinService::make(Assembly& assembly)
+{
+    auto service = std::make_shared<TavrinService>(assembly);
+    assembly.guidController = std::make_shared<TavrinUserGUIDController>(assembly);
+    assembly.clientSessionManager = std::make_shared<ClientSessionManager>(assembly, assembly.guidController, "tavrin");
+    assembly.flusherXPCListener = TavrinFlusherXPC::make(assembly, [weak = service->weak_from_this()] {
+        auto self = weak.lock();
+        return self ? self->getClientConnections() : std::vector<std::shared_ptr<ClientConnection>>();
+    });
+    return service;
+}
+
+TavrinService::TavrinService(Assembly& assembly)
+    : _assembly(assembly), _started(assembly.device.clock.wallNow()),
+      _queue(assembly.device.serialQueue("com.quorvane.tavrin.serviceQueue"))
+{}
+
+TavrinService::~TavrinService() = default;
+
+std::optional<std::string> TavrinService::clientIDForConnection(platform::ProcessIdentity& processes, pid_t pid)
+{
+    if (auto application = processes.applicationId(pid)) return application;
+    const auto path = processes.executablePath(pid);
+    if (!path) {
+        log().error("error getting path for pid [{}] {}", pid, path.error().reason());
+        return std::nullopt;
+    }
+    return path->substr(path->find_last_of('/') + 1);
+}
+
+void TavrinService::listenerShouldAcceptNewConnection(std::shared_ptr<ipc::Connection> connection)
+{
+    const pid_t pid = connection->peer().pid;
+    const std::string clientId = clientIDForConnection(_assembly.device.processes, pid).value_or("none");
+    log().log("new connection from {} ({})", clientId, pid);
+
+    auto client = std::make_shared<ClientConnection>(_assembly, makeClientProxy(connection), connection);
+    connection->exportObject(daemonHandler(client, weak_from_this()));
+    connection->setInvalidationHandler([weak = weak_from_this(), weakClient = std::weak_ptr(client), clientId, pid] {
+        auto self = weak.lock();
+        auto invalidated = weakClient.lock();
+        if (self && invalidated) self->_connectionInvalidated(invalidated, clientId, pid);
+    });
+    _queue->async([self = shared_from_this(), client, pid] {
+        self->_connections.push_back(client);
+        const auto samePid = std::ranges::count_if(
+            self->_connections, [pid](const auto& other) { return other->connection()->peer().pid == pid; });
+        if (samePid >= 2) log().error("too many connections {} from pid {}", samePid, pid);
+    });
+    _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.clientconnection");
+    connection->resume();
+}
+
+/// On the connection's queue.
+void TavrinService::_connectionInvalidated(const std::shared_ptr<ClientConnection>& connection,
+                                           const std::string& clientId, pid_t pid)
+{
+    log().log("connection from {} ({}) invalidated", clientId, pid);
+    const auto shortName = connection->clientShortName();
+    _queue->async([self = shared_from_this(), connection] {
+        connection->flushSessionInvalidation([self, connection](bool flushed) {
+            TavrinLogForCategory(kLogSession).debug("session {} on invalidation", flushed ? "flushed" : "not flushed");
+            self->_queue->async([self, connection] { std::erase(self->_connections, connection); });
+        });
+    });
+    if (shortName) _assembly.diagnosticData.addValue(1, createCounterKey(*shortName, "xcpinvalidation"));
+}
+
+std::vector<std::shared_ptr<ClientConnection>> TavrinService::getClientConnections() const
+{
+    return _queue->sync([this] { return _connections; });
+}
+
+Value TavrinService::status()
+{
+    platform::Device& device = _assembly.device;
+    const platform::Date now = device.clock.wallNow();
+
+    Value::Array connections;
+    for (const auto& connection : getClientConnections()) {
+        connections.push_back(Value::dictionaryOf({{"pid", connection->connection()->peer().pid},
+                                                   {"client", connection->clientShortName().value_or("")},
+                                                   {"currentQueryId", connection->currentQueryId()}}));
+    }
+
+    platform::Dictionary bag;
+    bag.set("fetchInProgress", _assembly.bagController->fetchInProgress());
+    if (const auto current = _assembly.bagController->inMemoryBag()) {
+        bag.set("version", current->version());
+        bag.set("enabled", current->isEnabled());
+        if (const auto expiration = current->rawBag()["__expiration"].asDouble())
+            bag.set("expiresIn", *expiration - platform::secondsSince1970(now));
+    }
+
+    platform::Dictionary transactions;
+    for (const auto& [name, count] : device.transactions.open()) transactions.set(name, count);
+
+    Value::Array hosts;
+    for (const std::string& host : _assembly.clientStateManager->validImageHosts()) hosts.emplace_back(host);
+
+    return Value::dictionaryOf({{"version", ClientSessionManager::tavrindUserAgent()},
+                                {"pid", getpid()},
+                                {"uptime", platform::toSeconds(now - _started)},
+                                {"sharedSession", _assembly.sharedSession},
+                                {"connections", std::move(connections)},
+                                {"sessions", _assembly.clientStateManager->sessions()},
+                                {"bag", std::move(bag)},
+                                {"transactions", std::move(transactions)},
+                                {"validImageHosts", std::move(hosts)}});
+}
+
+std::string TavrinService::statistics()
+{
+    return _assembly.device.counters.openMetrics();
+}
+
+} // namespace tavrin

@@ -1,0 +1,39 @@
+// The daemon's entry point: the device, the services in their order, the signals, and then the run loop for ever.
+
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <unistd.h>
+
+#include "platform/Log.h"
+#include "platform/RunLoop.h"
+#include "platform/SystemDevice.h"
+#include "tavrind/DaemonOptions.h"
+#include "tavrind/Startup.h"
+
+int main(int argc, char** argv)
+{
+    const tavrin::DaemonOptions options = tavrin::parseDaemonOptions(argc, argv);
+    platform::RunLoop::blockSignals();
+    platform::setLogSink(options.logToJournal ? platform::LogSink::Journal : platform::LogSink::StandardError,
+                         "tavrind");
+    platform::Log::threshold = options.logLevel;
+
+    platform::RunLoop runLoop;
+    platform::SystemDevice device(runLoop, "com.quorvane.tavrind", "com.quorvane.lookup.shared");
+
+    auto daemon = tavrin::startUp(device.device());
+    if (!daemon) {
+        std::fprintf(stderr, "tavrind: %s\n", daemon.error().reason().c_str());
+        return EXIT_FAILURE;
+    }
+
+    // Nothing is flushed on the way out: what must survive a kill is on disk already.
+    for (const auto& [signal, name] : {std::pair(SIGINT, "SIGINT"), std::pair(SIGTERM, "SIGTERM")}) {
+        runLoop.onSignal(signal, [name] {
+            platform::defaultLog().debug("{}", name);
+            _exit(EXIT_SUCCESS);
+        });
+    }
+    runLoop.run();
+}
