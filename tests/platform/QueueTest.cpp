@@ -13,6 +13,8 @@ namespace platform {
 namespace {
 
 using namespace std::chrono_literals;
+using test::ManualClock;
+using test::ManualExecutor;
 
 struct QueueTest : testing::Test {
     ManualClock clock;

@@ -7,7 +7,7 @@
 #include "platform/Queue.h"
 #include "platform/UrlSession.h"
 
-namespace platform {
+namespace platform::test {
 
 /// A loader that a test answers by hand.
 class FakeUrlLoader final : public UrlLoader {
@@ -79,4 +79,4 @@ public:
     std::vector<std::shared_ptr<Session>> sessions;
 };
 
-} // namespace platform
+} // namespace platform::test

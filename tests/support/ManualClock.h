@@ -5,7 +5,7 @@
 
 #include "platform/Clock.h"
 
-namespace platform {
+namespace platform::test {
 
 /// A clock that a test moves by hand. It starts on 2026-01-01 00:00 UTC, one hour after the device woke.
 class ManualClock final : public Clock {
@@ -81,4 +81,4 @@ private:
     TimerId _lastId = 0;
 };
 
-} // namespace platform
+} // namespace platform::test

@@ -5,7 +5,7 @@
 
 #include "platform/Queue.h"
 
-namespace platform {
+namespace platform::test {
 
 /// An executor without threads: jobs wait until a test drains them, in order, on its own thread.
 class ManualExecutor final : public Executor {
@@ -36,4 +36,4 @@ private:
     std::deque<Job> _jobs;
 };
 
-} // namespace platform
+} // namespace platform::test

@@ -1,0 +1,234 @@
+#include <cmath>
+
+#include "CoreTavrin/TAVBag.h"
+#include "tavrind/TAVNetworkRequestFactory.h"
+#include "tavrind/TavrinBagController.h"
+#include "tests/support/DaemonFixture.h"
+
+namespace tavrin::test {
+namespace {
+
+using namespace std::chrono_literals;
+const std::filesystem::path kPath = "/caches/com.quorvane.tavrind/bag.plist";
+
+TEST(BagStaleness, IsDecidedByTimeThenByUrl)
+{
+    const auto now = platform::dateFromSecondsSince1970(1000000);
+    const std::string url = "u";
+    const auto same = [] { return std::string("u"); };
+    const auto other = [] { return std::string("v"); };
+    EXPECT_EQ(bagStaleness(1000599, &url, now, same), BagStaleness::Expired);
+    EXPECT_EQ(bagStaleness(1000600, &url, now, same), BagStaleness::Fresh);
+    EXPECT_EQ(bagStaleness(1000601, &url, now, same), BagStaleness::Fresh);
+    EXPECT_EQ(bagStaleness(1000601, &url, now, other), BagStaleness::UrlChanged);
+    EXPECT_EQ(bagStaleness(1000601, nullptr, now, same), BagStaleness::NoUrl);
+    EXPECT_EQ(bagStaleness(std::nullopt, &url, now, same), BagStaleness::Expired);
+    EXPECT_EQ(bagStaleness(NAN, &url, now, same), BagStaleness::Expired);
+    EXPECT_EQ(bagStaleness(1e300, &url, now, same), BagStaleness::Fresh);
+}
+
+TEST(BagVersion, ComparesNumbersAsNumbers)
+{
+    const std::pair<const char*, const char*> ordered[]{
+        {"9", "10"},   {"", "1"},    {"1.9", "1.10"},
+        {"a2", "a10"}, {"1", "1.0"}, {"99999999999999999998", "99999999999999999999"}};
+    for (const auto& [a, b] : ordered) {
+        EXPECT_TRUE(versionPrecedes(a, b)) << a << " " << b;
+        EXPECT_FALSE(versionPrecedes(b, a)) << a << " " << b;
+    }
+    EXPECT_FALSE(versionPrecedes("010", "10"));
+    EXPECT_FALSE(versionPrecedes("10", "010"));
+}
+
+struct BagControllerTest : DaemonTest {
+    TavrinBagController& controller() { return *assembly().bagController; }
+    int announced = 0;
+    std::vector<std::string> errors;
+    platform::NotificationCenter::Token token =
+        device.notifications.observe(TAVBagChangeNotification, [this](const platform::Notification& notification) {
+            if (notification.get<std::shared_ptr<const TAVBag>>("bag"))
+                ++announced;
+            else
+                errors.push_back(notification.get<platform::Error>("bagError").reason());
+        });
+};
+
+TEST_F(BagControllerTest, FetchesOnceKeepsItOnDiskAndRestartsFromThere)
+{
+    start();
+    EXPECT_EQ(tasks().size(), 1u) << "start-up asks for the first bag";
+    EXPECT_EQ(device.transactions.open(), (std::map<std::string, int>{{"bagFetch", 1}}));
+    EXPECT_FALSE(controller().currentBag());
+    EXPECT_FALSE(controller().currentBag());
+    device.drain();
+    EXPECT_EQ(tasks().size(), 1u) << "one fetch at a time";
+    deliverBag();
+    EXPECT_EQ(controller().currentBag()->version(), "9");
+    EXPECT_EQ(announced, 1);
+    EXPECT_TRUE(device.transactions.open().empty());
+    EXPECT_EQ(counter("bag.fetches"), 1);
+    const auto raw = controller().currentBag()->rawBag();
+    EXPECT_EQ(raw["__expiration"].asDouble(), platform::secondsSince1970(device.clock.wallNow()) + 14400);
+    EXPECT_TRUE(raw["__bagurl"].asString()->contains("agent=tavrind%2F0.1.0") ||
+                raw["__bagurl"].asString()->contains("agent=tavrind/0.1.0"));
+    EXPECT_EQ(platform::parsePropertyList(device.files.files.at(kPath)), raw);
+
+    start();
+    EXPECT_EQ(controller().inMemoryBag()->version(), "9");
+    EXPECT_EQ(announced, 2);
+    EXPECT_TRUE(tasks().empty()) << "fresh enough";
+
+    device.clock.setWall(device.clock.wallNow() + 14400s - 599s);
+    EXPECT_EQ(controller().currentBag()->version(), "9") << "a stale bag is still answered";
+    device.drain();
+    EXPECT_EQ(tasks().size(), 1u) << "and fetched anew";
+    EXPECT_EQ(counter("bag.expired"), 1);
+}
+
+// The service's faults: each leaves the bag at hand, is announced, and doesn't stop the next fetch.
+TEST_F(BagControllerTest, FailedFetchesLeaveTheOldBag)
+{
+    start();
+    deliverBag();
+    const std::string onDisk = device.files.files.at(kPath);
+    const std::pair<std::function<void()>, const char*> faults[]{
+        {[&] { lastTask()->fail(platform::Error::withReason("UrlErrorDomain", -1001, "timed out")); }, "timed out"},
+        {[&] { lastTask()->finish(std::nullopt, platform::UrlResponse{.statusCode = 200}, std::nullopt); }, "no data"},
+        {[&] { lastTask()->respond(304, ""); }, "statusCode 304"},
+        {[&] { lastTask()->respond(500, kBag); }, "statusCode 500"},
+        {[&] { lastTask()->respond(200, "[]"); }, "not JSON object"},
+        {[&] { lastTask()->respond(200, "null"); }, "not JSON object"},
+        {[&] { lastTask()->respond(200, "{"); }, nullptr},
+        {[&] { lastTask()->respond(200, ""); }, nullptr},
+        {[&] { lastTask()->respond(200, std::string(10000, '[')); }, nullptr},
+        {[&] { lastTask()->respond(200, "{\"a\": \"\xff\"}"); }, nullptr},
+    };
+    for (const auto& [fault, reason] : faults) {
+        controller().forceFetchBag(Value::dictionaryOf({{"bag", 100}}));
+        errors.clear();
+        fault();
+        device.drain();
+        ASSERT_EQ(errors.size(), 1u);
+        if (reason) { EXPECT_EQ(errors[0], reason); }
+        EXPECT_EQ(controller().inMemoryBag()->version(), "9");
+    }
+    EXPECT_EQ(device.files.files.at(kPath), onDisk);
+    EXPECT_EQ(announced, 1);
+    EXPECT_EQ(counter("bag.fetchesfailed"), std::ssize(faults));
+    EXPECT_TRUE(device.transactions.open().empty());
+}
+
+TEST_F(BagControllerTest, ABrokenCacheFileIsAsGoodAsNone)
+{
+    const auto valid = platform::toPropertyList(Value::dictionaryOf({{"version", "1"}, {"__expiration", 9e9}})).value();
+    const std::pair<std::string, bool> contents[]{{"", false},
+                                                  {"bplist00", false},
+                                                  {valid.substr(0, valid.size() - 1), false},
+                                                  {platform::toPropertyList(Value::Array{1}).value(), false},
+                                                  {valid, true}};
+    for (const auto& [bytes, readable] : contents) {
+        device.files.directories.insert(kPath.parent_path());
+        device.files.files[kPath] = bytes;
+        start();
+        EXPECT_EQ(controller().inMemoryBag() != nullptr, readable) << bytes.size();
+        EXPECT_EQ(tasks().size(), 1u) << "without a URL on record the bag is stale too";
+    }
+    device.files.files.erase(kPath);
+    device.files.directories.insert(kPath);
+    platform::test::LogCapture log;
+    start();
+    EXPECT_TRUE(log.has(platform::LogLevel::Fault, "Tavrin_Bag", "Error reading from bag cache: "));
+    deliverBag();
+    EXPECT_EQ(controller().currentBag()->version(), "9") << "a directory in the file's place costs only the cache";
+}
+
+TEST_F(BagControllerTest, AFullDiskCostsOnlyTheCache)
+{
+    for (const char* operation : {"write", "mkdir"}) {
+        device.files.fault = [operation](std::string_view op, const auto&) { return op == operation ? ENOSPC : 0; };
+        platform::test::LogCapture log;
+        start();
+        deliverBag();
+        EXPECT_EQ(controller().currentBag()->version(), "9");
+        EXPECT_TRUE(device.files.files.empty());
+        EXPECT_GE(log.count("Could not write to ") + log.count("Couldn't get path to cache bag.  Error: "), 1);
+    }
+}
+
+TEST_F(BagControllerTest, AsksTheConfiguredEndpoint)
+{
+    start();
+    const auto url = [&](const char* country) { return controller().bagFetchURLWithCountry(country).string(); };
+    EXPECT_EQ(url("CH"), "https://bag.quorvane.example/bag");
+    EXPECT_EQ(url(""), "https://bag.quorvane.example/bag");
+    EXPECT_EQ(url("cn"), "https://bag-cn.quorvane.example/bag");
+    device.userDefaults.set("TAVBagURL", "");
+    EXPECT_EQ(url("CN"), "https://bag-cn.quorvane.example/bag");
+    device.userDefaults.set("TAVBagURL", "https://localhost:1/bag");
+    EXPECT_EQ(url("CN"), "https://localhost:1/bag");
+    platform::test::LogCapture log;
+    device.userDefaults.set("TAVBagURL", "not a url");
+    EXPECT_EQ(url("CH"), "https://bag.quorvane.example/bag");
+    EXPECT_TRUE(
+        log.has(platform::LogLevel::Error, "Tavrin_Bag", "Malformed tavrin bag URL in user defaults key TAVBagURL"));
+}
+
+TEST_F(BagControllerTest, OnlyAChangeOfTheUrlCausesAFetch)
+{
+    start();
+    deliverBag();
+    device.locale.context.preferredLanguages = {"fr"}; // a header of the fetch, not in the URL
+    device.locale.handler(platform::LocaleSource::Change::Locale);
+    device.drain();
+    EXPECT_EQ(tasks().size(), 1u);
+    device.locale.context.identifier = "fr_CH";
+    device.locale.handler(platform::LocaleSource::Change::Locale);
+    device.drain();
+    EXPECT_EQ(tasks().size(), 2u);
+    deliverBag();
+    const platform::Notification fromAnother{.name = TAVBagRefreshRequired, .object = this};
+    device.clock.setWall(device.clock.wallNow() + 14400s);
+    device.notifications.post(fromAnother);
+    device.drain();
+    EXPECT_EQ(tasks().size(), 2u) << "only the request factory is listened to";
+}
+
+TEST_F(BagControllerTest, TellsTheSystemWhenTheNewsClientsFortuneChanges)
+{
+    using Names = std::vector<std::string>;
+    start();
+    deliverBag(R"({"clients": {"news": {"isEnabled": false}}})");
+    EXPECT_EQ(device.notifier.posted, Names{kNewsDisabledNotifyName});
+    const auto refetch = [&](const char* body) {
+        device.notifier.posted.clear();
+        device.clock.setWall(device.clock.wallNow() + 14400s);
+        (void)controller().currentBag();
+        device.drain();
+        deliverBag(body);
+        return device.notifier.posted;
+    };
+    EXPECT_EQ(refetch(R"({"isEnabled": false})"), Names{});
+    EXPECT_EQ(refetch("{}"), Names{kNewsEnabledNotifyName});
+    device.notifier.posted.clear();
+    start();
+    EXPECT_TRUE(device.notifier.posted.empty()) << "a bag from disk is no news";
+    EXPECT_EQ(refetch("{}"), Names{});
+    EXPECT_EQ(refetch(R"({"isEnabled": false})"), Names{kNewsDisabledNotifyName});
+}
+
+// The system clock may be years off, either way, and be put right while we run.
+TEST_F(BagControllerTest, ClockChangesNeverLoseTheBag)
+{
+    start();
+    deliverBag();
+    for (const auto years : {-10, 10}) {
+        device.clock.setWall(device.clock.wallNow() + years * 365 * 24h);
+        EXPECT_EQ(controller().currentBag()->version(), "9");
+        device.drain();
+        if (years > 0) deliverBag();
+    }
+    EXPECT_EQ(tasks().size(), 2u) << "expired only when the clock went forward";
+}
+
+} // namespace
+} // namespace tavrin::test

@@ -1,0 +1,279 @@
+#include "searchrecords/ZRRecords.h"
+#include "searchrecords/ZRResultFeedback.h"
+#include "tavrind/ClientConnection.h"
+#include "tavrind/ClientState.h"
+#include "tavrind/ClientStateManager.h"
+#include "tavrind/TavrinLogging.h"
+#include "tavrind/TavrinService.h"
+#include "tests/support/DaemonFixture.h"
+
+namespace tavrin::test {
+namespace {
+
+using namespace std::chrono_literals;
+
+struct ConnectionTest : DaemonTest {
+    ConnectionTest()
+    {
+        start();
+        deliverBag();
+    }
+    void report(FakeConnection& connection, std::string className, Dictionary fields = {})
+    {
+        fields.set("class", std::move(className));
+        connection.call("ReportEvent", {"event", 3, std::move(fields)});
+        device.drain();
+    }
+};
+
+TEST_F(ConnectionTest, ConfigureAnswersTheEndpointThenPushesTheBag)
+{
+    auto connection = connect();
+    auto call = configure(*connection, "com.quorvane.vistrel", "Vistrel/4");
+    EXPECT_EQ(call->argument(0), Value(assembly().clientStateManager->endpoint()));
+    auto pushes = connection->takePushes();
+    ASSERT_EQ(pushes.size(), 1u);
+    EXPECT_EQ(pushes[0].signal, "BagDidLoad");
+
+    device.clock.setWall(device.clock.wallNow() + 14400s);
+    (void)connection->call("Bag");
+    (void)search(*connection, 1, "weat");
+    connection->call("ListSessions");
+    auto warm = connect(5);
+    (void)configure(*warm, "com.quorvane.wendral", "Wendral/1");
+    report(*warm, "ZRSearchViewAppearFeedback", {{"viewAppearEvent", 5}});
+    for (const auto& task : tasks())
+        if (!task->finished && task->originalRequest().url.path() == "/bag") task->respond(200, kBag);
+    device.drain();
+    EXPECT_EQ(connection->takePushes().size(), 1u) << "every later bag is pushed";
+}
+
+TEST_F(ConnectionTest, AnInvalidConfigurationClosesTheConnection)
+{
+    for (const auto& [identifier, agent] : {std::pair("", "A/1"), std::pair("id", ""), std::pair("", "")}) {
+        platform::test::LogCapture log;
+        auto connection = connect();
+        auto call = configure(*connection, identifier, agent);
+        EXPECT_TRUE(call->abandoned());
+        EXPECT_TRUE(connection->invalidated());
+        EXPECT_TRUE(
+            log.has(platform::LogLevel::Fault, "Tavrin_Session", "configuration requires identifier and agent"));
+        EXPECT_TRUE(log.has(platform::LogLevel::Fault, "Tavrin_Session", "invalid configuration, closing connection"));
+        EXPECT_EQ(session->takeClasses(), std::vector<std::string>{"ZRErrorFeedback"});
+    }
+}
+
+TEST_F(ConnectionTest, ASecondIdentifierKeepsTheFirstState)
+{
+    auto connection = client("com.quorvane.vistrel");
+    platform::test::LogCapture log;
+    EXPECT_TRUE(configure(*connection, "com.quorvane.news", "news/1")->answered());
+    EXPECT_TRUE(log.has(platform::LogLevel::Fault, "Tavrin_Session", "session identifier must match"));
+    EXPECT_EQ(assembly().clientStateManager->sessions().size(), 1u);
+}
+
+TEST_F(ConnectionTest, AnUnconfiguredConnectionIsServedWhatNeedsNoClient)
+{
+    auto connection = connect();
+    EXPECT_EQ(reasonOf(*search(*connection, 1, "weat")), "client state nil");
+    auto sessions = connection->call("ListSessions");
+    auto resource = connection->call("FileHandleAndAttributesForResource", {"TAVQIFeatures"});
+    auto flusher = connection->call("ListenToFlusher");
+    auto status = connection->call("Status");
+    auto feedback = connection->call("Feedback", {""});
+    device.drain();
+    EXPECT_TRUE(sessions->answered() && flusher->answered() && feedback->answered());
+    EXPECT_EQ(resource->argument(2)["code"], Value(404));
+    EXPECT_EQ(status->argument(0)["bag"]["version"], Value("9"));
+    report(*connection, "ZRClearInputFeedback");
+    connection->end();
+    device.drain();
+    EXPECT_TRUE(daemon->service->getClientConnections().empty());
+}
+
+TEST_F(ConnectionTest, MalformedCallsAreRefusedAndTheConnectionLivesOn)
+{
+    auto connection = client();
+    auto call = connection->call("Request", {Value::dictionaryOf({{"class", "TAVSearchRequest"}, {"queryId", "one"}})});
+    device.drain();
+    const auto refused = call->take();
+    ASSERT_FALSE(refused);
+    EXPECT_TRUE(refused.error().message.contains("request") && refused.error().message.contains("queryId"))
+        << refused.error().message;
+    EXPECT_TRUE(search(*connection, 1, "weat")->pending());
+}
+
+TEST_F(ConnectionTest, MissingDefaultsAreCompletedFromTheDevice)
+{
+    device.profile.current.screenScale = 3;
+    auto connection = client();
+    platform::test::LogCapture log;
+    (void)search(*connection, 1, "weat", {{"scale", 0.0}, {"keyboardInputMode", ""}});
+    EXPECT_EQ(*lastTask()->originalRequest().headers.find("X-Quorvane-UI-Scale"), "3.0");
+    EXPECT_EQ(lastTask()->originalRequest().url.queryValue("kb_ime"), "en_US@layout=default");
+    EXPECT_TRUE(log.has(platform::LogLevel::Error, "Tavrin_Request", "keyboardInputMode property not set, using "));
+    device.locale.inputMode = "fr";
+    (void)search(*connection, 2, "weat", {{"keyboardInputMode", ""}});
+    EXPECT_EQ(lastTask()->originalRequest().url.queryValue("kb_ime"), "fr");
+}
+
+TEST_F(ConnectionTest, ConnectionsOfOneClientShareItsState)
+{
+    auto& manager = *assembly().clientStateManager;
+    EXPECT_EQ(manager.stateForClientIdentifier("a"), manager.stateForClientIdentifier("a"));
+    EXPECT_NE(manager.stateForClientIdentifier("a"), manager.stateForClientIdentifier("b"));
+    EXPECT_FALSE(manager.stateForClientIdentifier(""));
+    EXPECT_FALSE(manager.stateForClientIdentifier(std::nullopt));
+    EXPECT_TRUE(manager.sessions().empty()) << "none has a user agent yet";
+}
+
+TEST_F(ConnectionTest, TheRegistryPersistsOnlyWhenAskedTo)
+{
+    (void)client();
+    EXPECT_TRUE(device.userDefaults.value("sessions").isNull());
+    device.userDefaults.set("TAVPersistSessions", true);
+    start();
+    (void)client("com.quorvane.vistrel", "Vistrel/4");
+    (void)assembly().clientStateManager->stateForClientIdentifier("nobody");
+    start();
+    EXPECT_EQ(assembly().clientStateManager->sessions(),
+              (Value::Array{Value::dictionaryOf({{"identifier", "com.quorvane.vistrel"}, {"agent", "Vistrel/4"}})}));
+    device.userDefaults.set(
+        "sessions", Value::Array{3, Value::dictionaryOf({{"agent", "x"}}), Value::dictionaryOf({{"identifier", "i"}})});
+    start();
+    EXPECT_TRUE(assembly().clientStateManager->sessions().empty());
+    EXPECT_TRUE(assembly().clientStateManager->stateForClientIdentifier("i")->sessionManager())
+        << "restored before there was one";
+}
+
+TEST_F(ConnectionTest, TheEndpointServesMoreResultsAndCardsAlone)
+{
+    auto main = client();
+    auto endpoint = device.ipc.connect(assembly().clientStateManager->endpoint());
+    const auto ask = [&](const char* className, const char* identifier) {
+        auto call = endpoint->call(
+            "Request", {Value::dictionaryOf({{"class", className},
+                                             {"queryId", 4},
+                                             {"moreResultsURL", "https://m.example/x"},
+                                             {"cardURL", "https://m.example/x"}}),
+                        Value::dictionaryOf({{"class", "TAVSessionConfiguration"}, {"identifier", identifier}})});
+        device.drain();
+        return call;
+    };
+    auto more = ask("TAVMoreResultsRequest", "com.quorvane.vistrel");
+    respond("[]");
+    EXPECT_GT(more->argument(1).count(), 0u);
+    EXPECT_TRUE(ask("TAVCardRequest", "com.quorvane.vistrel")->pending());
+    EXPECT_TRUE(ask("TAVZeroKeywordRequest", "com.quorvane.vistrel")->abandoned());
+    EXPECT_TRUE(ask("TAVSearchRequest", "com.quorvane.vistrel")->abandoned());
+    auto nobody = ask("TAVMoreResultsRequest", "");
+    EXPECT_EQ(nobody->argument(0), Value(4));
+    EXPECT_TRUE(reasonOf(*nobody).starts_with("invalid configuration "));
+    auto images = endpoint->call("LoadImages", {Value::Array{}, 0u});
+    device.drain();
+    EXPECT_TRUE(images->answered());
+}
+
+TEST_F(ConnectionTest, CountsConnectionsAndTheirEnds)
+{
+    platform::test::LogCapture log;
+    auto first = client("com.quorvane.vistrel", "Vistrel/4", 90);
+    EXPECT_EQ(log.count("too many connections"), 0);
+    auto second = connect(90);
+    EXPECT_TRUE(log.has(platform::LogLevel::Error, "Tavrin_Connection", "too many connections 2 from pid 90"));
+    EXPECT_TRUE(second->resumed()) << "it is accepted all the same";
+    EXPECT_EQ(counter("clientconnection"), 2);
+    EXPECT_EQ(counter("launch"), 1);
+    first->end();
+    device.drain();
+    EXPECT_EQ(counter("vistrel.xcpinvalidation"), 1);
+    EXPECT_EQ(log.count("session not flushed on invalidation"), 1);
+    EXPECT_EQ(daemon->service->getClientConnections().size(), 1u);
+}
+
+TEST_F(ConnectionTest, NamesItsPeer)
+{
+    device.processes.applications[1] = "org.example.Browser";
+    device.processes.paths[2] = "/usr/lib/search screen";
+    platform::test::LogCapture log;
+    EXPECT_EQ(TavrinService::clientIDForConnection(device.processes, 1), "org.example.Browser");
+    EXPECT_EQ(TavrinService::clientIDForConnection(device.processes, 2), "search screen");
+    EXPECT_EQ(TavrinService::clientIDForConnection(device.processes, 3), std::nullopt);
+    EXPECT_TRUE(log.has(platform::LogLevel::Error, "Tavrin_Connection", "error getting path for pid [3] "));
+    EXPECT_TRUE(connect(3)->resumed());
+}
+
+TEST_F(ConnectionTest, EventsReachTheSessionWithTheirQuery)
+{
+    auto connection = client();
+    report(
+        *connection, "ZRResultEngagementFeedback",
+        {{"result", Value::dictionaryOf({{"class", "ZRSearchResult"}, {"queryId", 12}, {"type", 1}, {"topHit", 2}})}});
+    ASSERT_EQ(session->records.size(), 1u);
+    const TavrinFeedback& record = *session->records[0];
+    EXPECT_EQ(record.queryId, 3);
+    EXPECT_EQ(record.clientQueryId, 12u);
+    EXPECT_EQ(record.userAgent, "Vistrel/4");
+    EXPECT_EQ(record.feedback->timestamp, device.clock.hostTicks()) << "stamped on arrival";
+    EXPECT_EQ(counter("vistrel.tophit.engagements"), 1);
+    EXPECT_EQ(counter("vistrel.tavrin.engagements"), 1);
+
+    report(*connection, "ZRClearInputFeedback", {{"timestamp", 5}});
+    EXPECT_EQ(session->records[1]->feedback->timestamp, 5u);
+    for (const int type : {0, 1, 2, 3, 9}) report(*connection, "ZRCustomFeedback", {{"feedbackType", type}});
+    EXPECT_EQ(session->records.size(), 2u) << "custom records take their own road";
+    EXPECT_EQ(counter("dp.submit"), 1);
+    report(*connection, "TavrinConnectionInvalidated");
+    report(*connection, "ZRSearchResult");
+    EXPECT_EQ(session->records.size(), 2u) << "not a client's to send";
+}
+
+TEST_F(ConnectionTest, WarmsTheConnectionWhenASearchViewAppears)
+{
+    auto connection = client();
+    device.advance(31s);
+    const auto warmed = [&](int event, bool lockScreen) {
+        const std::size_t before = tasks().size();
+        report(*connection, "ZRSearchViewAppearFeedback", {{"viewAppearEvent", event}, {"isOnLockScreen", lockScreen}});
+        return tasks().size() > before;
+    };
+    EXPECT_FALSE(warmed(2, true));
+    EXPECT_FALSE(warmed(1, false));
+    EXPECT_TRUE(warmed(2, false));
+    EXPECT_EQ(lastTask()->originalRequest().url.string(), "https://s.example/warm");
+    device.advance(29s);
+    EXPECT_FALSE(warmed(24, false)) << "still warm";
+    device.advance(1s);
+    EXPECT_TRUE(warmed(24, false));
+}
+
+TEST(ClientQueryId, IsThatOfTheFirstResultConcerned)
+{
+    const auto result = std::make_shared<ZRSearchResult>();
+    result->queryId = 7;
+    const auto section = std::make_shared<ZRResultSection>();
+    section->results = {result};
+    ZRVisibleResultsFeedback visible;
+    EXPECT_EQ(clientQueryIdOf(visible), 0u);
+    visible.results = {nullptr};
+    EXPECT_EQ(clientQueryIdOf(visible), 0u);
+    visible.results = {result};
+    EXPECT_EQ(clientQueryIdOf(visible), 7u);
+    ZRLateSectionsAppendedFeedback late;
+    late.sections = {section};
+    EXPECT_EQ(clientQueryIdOf(late), 7u);
+    ZRSectionEngagementFeedback engagement;
+    EXPECT_EQ(clientQueryIdOf(engagement), 0u);
+    engagement.section = section;
+    EXPECT_EQ(clientQueryIdOf(engagement), 7u);
+}
+
+TEST(Logging, ACategoryOutOfRangeIsAProgrammingError)
+{
+    EXPECT_EQ(TavrinLogForCategory(0).category(), "Tavrin");
+    EXPECT_EQ(TavrinLogForCategory(18).category(), "Tavrin_Feedback_Storage");
+    EXPECT_DEATH((void)TavrinLogForCategory(19), "category < TavrinLoggingCategoryCount");
+}
+
+} // namespace
+} // namespace tavrin::test

@@ -1,0 +1,85 @@
+#include "tests/support/MemoryFiles.h"
+
+#include <cerrno>
+#include <sys/mman.h>
+#include <unistd.h>
+
+namespace platform::test {
+
+namespace fs = std::filesystem;
+
+int MemoryFiles::faultOf(std::string_view operation, const fs::path& path) const
+{
+    return fault ? fault(operation, path) : 0;
+}
+
+Result<Bytes> MemoryFiles::read(const fs::path& path, std::size_t maximumSize)
+{
+    std::lock_guard lock(_mutex);
+    if (const int error = faultOf("read", path)) return std::unexpected(Error::posix(error));
+    const auto found = files.find(path);
+    if (found == files.end()) return std::unexpected(Error::posix(directories.contains(path) ? EISDIR : ENOENT));
+    if (found->second.size() > maximumSize) return std::unexpected(Error::posix(EFBIG));
+    return Bytes(found->second);
+}
+
+Result<void> MemoryFiles::writeAtomically(const fs::path& path, std::string_view contents)
+{
+    std::lock_guard lock(_mutex);
+    if (const int error = faultOf("write", path)) return std::unexpected(Error::posix(error));
+    if (!directories.contains(path.parent_path())) return std::unexpected(Error::posix(ENOENT));
+    if (directories.contains(path)) return std::unexpected(Error::posix(EISDIR));
+    files[path] = contents;
+    return {};
+}
+
+Result<void> MemoryFiles::createDirectories(const fs::path& path)
+{
+    std::lock_guard lock(_mutex);
+    if (const int error = faultOf("mkdir", path)) return std::unexpected(Error::posix(error));
+    for (fs::path each = path; each.has_relative_path(); each = each.parent_path()) {
+        if (files.contains(each)) return std::unexpected(Error::posix(ENOTDIR));
+        directories.insert(each);
+    }
+    return {};
+}
+
+Result<FileInfo> MemoryFiles::info(const fs::path& path)
+{
+    std::lock_guard lock(_mutex);
+    if (const int error = faultOf("info", path)) return std::unexpected(Error::posix(error));
+    if (directories.contains(path)) return FileInfo{.kind = FileInfo::Kind::Directory};
+    if (!files.contains(path)) return std::unexpected(Error::posix(ENOENT));
+    return FileInfo{.size = files[path].size()};
+}
+
+Result<void> MemoryFiles::remove(const fs::path& path)
+{
+    std::lock_guard lock(_mutex);
+    if (const int error = faultOf("remove", path)) return std::unexpected(Error::posix(error));
+    if (files.erase(path) == 0) return std::unexpected(Error::posix(ENOENT));
+    return {};
+}
+
+Result<std::vector<std::string>> MemoryFiles::list(const fs::path& path)
+{
+    std::lock_guard lock(_mutex);
+    if (const int error = faultOf("list", path)) return std::unexpected(Error::posix(error));
+    if (!directories.contains(path)) return std::unexpected(Error::posix(ENOENT));
+    std::vector<std::string> names;
+    for (const auto& [file, contents] : files)
+        if (file.parent_path() == path) names.push_back(file.filename());
+    return names;
+}
+
+Result<FileHandle> MemoryFiles::openForReading(const fs::path& path)
+{
+    auto contents = read(path, SIZE_MAX);
+    if (!contents) return std::unexpected(contents.error());
+    FileHandle handle(memfd_create("file", MFD_CLOEXEC));
+    if (write(handle.fd(), contents->data(), contents->size()) < 0) return std::unexpected(Error::posix(errno));
+    lseek(handle.fd(), 0, SEEK_SET);
+    return handle;
+}
+
+} // namespace platform::test

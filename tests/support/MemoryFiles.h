@@ -1,0 +1,35 @@
+#pragma once
+
+#include <functional>
+#include <map>
+#include <mutex>
+#include <set>
+
+#include "platform/Files.h"
+
+namespace platform::test {
+
+/// Files in memory. An operation fails when the test says so.
+class MemoryFiles final : public FileSystem {
+public:
+    /// Asked before every operation ("read", "write", "mkdir", "info", "remove", "list", "open") with its path; a
+    /// number other than 0 is the errno that it fails with.
+    std::function<int(std::string_view operation, const std::filesystem::path& path)> fault;
+
+    std::map<std::filesystem::path, std::string> files;
+    std::set<std::filesystem::path> directories;
+
+    Result<Bytes> read(const std::filesystem::path& path, std::size_t maximumSize) override;
+    Result<void> writeAtomically(const std::filesystem::path& path, std::string_view contents) override;
+    Result<void> createDirectories(const std::filesystem::path& path) override;
+    Result<FileInfo> info(const std::filesystem::path& path) override;
+    Result<void> remove(const std::filesystem::path& path) override;
+    Result<std::vector<std::string>> list(const std::filesystem::path& path) override;
+    Result<FileHandle> openForReading(const std::filesystem::path& path) override;
+
+private:
+    [[nodiscard]] int faultOf(std::string_view operation, const std::filesystem::path& path) const;
+    std::mutex _mutex;
+};
+
+} // namespace platform::test

@@ -1,0 +1,172 @@
+#pragma once
+
+#include <functional>
+#include <string>
+#include <vector>
+
+#include "platform/Counters.h"
+#include "platform/Device.h"
+#include "platform/DeviceProfile.h"
+#include "platform/LocaleSource.h"
+#include "platform/LocationSource.h"
+#include "platform/Log.h"
+#include "platform/NotificationCenter.h"
+#include "platform/Process.h"
+#include "platform/Transactions.h"
+#include "platform/UserDefaults.h"
+#include "tests/support/FakeIpc.h"
+#include "tests/support/FakeUrlLoader.h"
+#include "tests/support/ManualClock.h"
+#include "tests/support/ManualExecutor.h"
+#include "tests/support/MemoryFiles.h"
+
+namespace platform::test {
+
+struct FakeLocale final : LocaleSource {
+    LocaleContext context;
+    std::string zone = "Europe/Zurich";
+    std::string inputMode;
+    std::function<void(Change)> handler;
+    LocaleContext locale() override { return context; }
+    std::string timeZone() override { return zone; }
+    std::string keyboardInputMode() override { return inputMode; }
+    std::string defaultInputMode() override { return "en_US@layout=default"; }
+    void onChange(std::function<void(Change)> newHandler) override { handler = std::move(newHandler); }
+};
+
+struct FakeLocation final : LocationSource {
+    std::set<std::string> allowed;
+    int updatesRequested = 0;
+    std::optional<Location> place;
+    Handler handler;
+    void setAllowedSources(std::set<std::string> sources) override { allowed = std::move(sources); }
+    std::optional<Location> current() override { return place; }
+    void requestUpdate() override { ++updatesRequested; }
+    void onChange(Handler newHandler) override { handler = std::move(newHandler); }
+    void moveTo(std::optional<Location> location)
+    {
+        place = location;
+        handler(location, location ? "" : "lost");
+    }
+};
+
+struct FakeProfile final : DeviceProfileSource {
+    DeviceProfile current;
+    std::function<void(const DeviceProfile&)> handler;
+    DeviceProfile profile() override { return current; }
+    void onChange(std::function<void(const DeviceProfile&)> newHandler) override { handler = std::move(newHandler); }
+    void change(DeviceProfile profile)
+    {
+        current = std::move(profile);
+        handler(current);
+    }
+};
+
+struct FakeProcesses final : ProcessIdentity {
+    std::map<pid_t, std::string> applications;
+    std::map<pid_t, std::string> paths;
+    std::optional<std::string> applicationId(pid_t pid) override
+    {
+        const auto found = applications.find(pid);
+        return found == applications.end() ? std::nullopt : std::optional(found->second);
+    }
+    Result<std::string> executablePath(pid_t pid) override
+    {
+        const auto found = paths.find(pid);
+        if (found == paths.end()) return std::unexpected(Error::posix(ENOENT));
+        return found->second;
+    }
+};
+
+struct FakeNotifier final : SystemNotifier {
+    std::vector<std::string> posted;
+    void post(const std::string& name) override { posted.push_back(name); }
+};
+
+/// Collects what is logged while it lives.
+class LogCapture {
+public:
+    struct Line {
+        LogLevel level;
+        std::string category;
+        std::string text;
+    };
+    /// Lines that contain `part`.
+    [[nodiscard]] int count(std::string_view part) const
+    {
+        std::lock_guard lock(_mutex);
+        int found = 0;
+        for (const Line& line : _lines) found += line.text.contains(part);
+        return found;
+    }
+    [[nodiscard]] bool has(LogLevel level, std::string_view category, std::string_view part) const
+    {
+        std::lock_guard lock(_mutex);
+        for (const Line& line : _lines)
+            if (line.level == level && line.category == category && line.text.contains(part)) return true;
+        return false;
+    }
+
+private:
+    mutable std::mutex _mutex;
+    std::vector<Line> _lines;
+    LogTap _tap{[this](const LogLine& line) {
+        std::lock_guard lock(_mutex);
+        _lines.push_back({line.level, std::string(line.category), std::string(line.text)});
+    }};
+};
+
+/// A device of twins, on one thread: work waits until `drain`, time until `advance`.
+struct TestDevice {
+    TestDevice()
+    {
+        failOnReplyMisuse();
+        device.makeQueues();
+    }
+
+    void drain() { executor.drain(); }
+    void advance(Duration by)
+    {
+        clock.advance(by, [this] { drain(); });
+    }
+
+    ManualClock clock;
+    ManualExecutor executor;
+    MemoryFiles files;
+    UserDefaults userDefaults;
+    UserDefaults lookupDefaults;
+    NotificationCenter notifications;
+    CounterStore counters;
+    Transactions transactions;
+    FakeLocale locale;
+    FakeLocation location;
+    FakeProfile profile;
+    FakeProcesses processes;
+    FakeNotifier notifier;
+    FakeUrlLoader loader;
+    FakeTransport ipc{executor, clock};
+    Device device{.clock = clock,
+                  .executor = executor,
+                  .mainExecutor = executor,
+                  .files = files,
+                  .directories = {.caches = "/caches",
+                                  .config = "/config",
+                                  .state = "/state",
+                                  .data = "/data",
+                                  .runtime = "/run",
+                                  .temporary = "/tmp"},
+                  .userDefaults = userDefaults,
+                  .lookupDefaults = lookupDefaults,
+                  .notifications = notifications,
+                  .counters = counters,
+                  .transactions = transactions,
+                  .locale = locale,
+                  .location = location,
+                  .profile = profile,
+                  .processes = processes,
+                  .systemNotifier = notifier,
+                  .urlLoader = loader,
+                  .ipc = ipc};
+};
+
+} // namespace platform::test
