@@ -45,6 +45,9 @@ template <class T> using Result = std::expected<T, Error>;
 
 /// Domain of errors of the device layer's own readers (JSON, property lists, archives, IPC messages).
 inline constexpr std::string_view kFormatErrorDomain = "Format";
+/// Codes in it: not of the format, or beyond a limit; a record of a class that the reader doesn't know.
+inline constexpr std::int64_t kFormatMalformed = 1;
+inline constexpr std::int64_t kFormatUnknownClass = 2;
 /// Domain of system call errors; codes are `errno`.
 inline constexpr std::string_view kPosixErrorDomain = "POSIX";
 

@@ -167,12 +167,16 @@ enum class JsonStyle { Compact, Pretty };
 /// Writes a value as JSON: doubles shortest-exact, integers as integers, bytes as base64, dates as seconds since
 /// 1970, non-finite numbers as null. Invalid UTF-8 in a string is written as U+FFFD.
 [[nodiscard]] std::string toJson(const Value& value, JsonStyle style = JsonStyle::Compact);
+/// The length of `toJson(value)`, without making it.
+[[nodiscard]] std::size_t jsonSize(const Value& value);
 
 /// Reads a binary property list of at most `maximumSize` bytes, nested at most `kMaximumDepth` deep.
-/// Integers come back as signed 64-bit numbers; types that JSON doesn't know but for dates and data are refused.
+/// Types that JSON doesn't know but for dates and data are refused.
 [[nodiscard]] std::expected<Value, Error> parsePropertyList(std::string_view bytes, std::size_t maximumSize = 64u << 20);
 
-/// Writes a binary property list. Null entries of dictionaries and arrays are left out: the format has none.
+/// Writes a binary property list. Null entries of dictionaries and arrays are left out: the format has none. Integers
+/// beyond 2^63-1 become reals, dates are kept to the microsecond. Refused: a null, texts with a NUL or broken UTF-8,
+/// dates beyond 2001 by more than 68 years, nesting beyond `kMaximumDepth`.
 [[nodiscard]] std::expected<std::string, Error> toPropertyList(const Value& value);
 
 } // namespace platform

@@ -1,0 +1,284 @@
+#include <array>
+#include <charconv>
+#include <cmath>
+#include <cstring>
+
+#include <fmt/format.h>
+#include <openssl/evp.h>
+#include <simdjson.h>
+
+#include "platform/Error.h"
+#include "platform/Value.h"
+
+namespace platform {
+
+namespace {
+
+// Reading
+
+namespace dom = simdjson::dom;
+
+/// A thread keeps its parser for documents up to this size; it needs some 15 bytes of memory for each of them.
+constexpr std::size_t kKeptParserCapacity = 64u << 10;
+
+std::unexpected<Error> malformed(std::string reason)
+{
+    return std::unexpected(Error::withReason(std::string(kFormatErrorDomain), kFormatMalformed, std::move(reason)));
+}
+
+/// The parser of this thread, made when first needed.
+std::unique_ptr<dom::parser>& threadParser()
+{
+    thread_local std::unique_ptr<dom::parser> parser;
+    if (!parser) parser = std::make_unique<dom::parser>();
+    return parser;
+}
+
+bool convert(dom::element element, std::size_t depth, Value& value);
+
+bool convertArray(dom::array array, std::size_t depth, Value& value)
+{
+    if (depth > kMaximumDepth) return false;
+    Value::Array elements;
+    elements.reserve(array.size());
+    for (const dom::element element : array)
+        if (!convert(element, depth, elements.emplace_back())) return false;
+    value = std::move(elements);
+    return true;
+}
+
+bool convertObject(dom::object object, std::size_t depth, Value& value)
+{
+    if (depth > kMaximumDepth) return false;
+    Dictionary entries;
+    entries.reserve(object.size());
+    for (const auto& [key, element] : object) {
+        Value entry;
+        if (!convert(element, depth, entry)) return false;
+        entries.set(std::string(key), std::move(entry));
+    }
+    value = std::move(entries);
+    return true;
+}
+
+/// False if `element`, which lies `depth` containers deep, nests too deep.
+bool convert(dom::element element, std::size_t depth, Value& value)
+{
+    switch (element.type()) {
+    case dom::element_type::ARRAY: return convertArray(element.get_array().value_unsafe(), depth + 1, value);
+    case dom::element_type::OBJECT: return convertObject(element.get_object().value_unsafe(), depth + 1, value);
+    case dom::element_type::INT64: value = element.get_int64().value_unsafe(); break;
+    case dom::element_type::UINT64: value = element.get_uint64().value_unsafe(); break;
+    case dom::element_type::DOUBLE: value = element.get_double().value_unsafe(); break;
+    case dom::element_type::STRING: value = element.get_string().value_unsafe(); break;
+    case dom::element_type::BOOL: value = element.get_bool().value_unsafe(); break;
+    case dom::element_type::NULL_VALUE: value = nullptr; break;
+    }
+    return true;
+}
+
+// Writing
+
+/// What a byte of a string needs.
+enum class Escape : std::uint8_t { None, Short, Unicode };
+
+constexpr auto kEscapes = [] {
+    std::array<Escape, 256> escapes{};
+    for (int c = 0; c < 0x20; ++c) escapes[c] = Escape::Unicode;
+    for (const unsigned char c : {'"', '\\', '\b', '\f', '\n', '\r', '\t'}) escapes[c] = Escape::Short;
+    return escapes;
+}();
+
+constexpr char shortEscape(char c)
+{
+    switch (c) {
+    case '\b': return 'b';
+    case '\f': return 'f';
+    case '\n': return 'n';
+    case '\r': return 'r';
+    case '\t': return 't';
+    default: return c;
+    }
+}
+
+/// `text` with U+FFFD in place of each byte that is no part of valid UTF-8.
+std::string repaired(std::string_view text)
+{
+    std::string valid;
+    valid.reserve(text.size() + 16);
+    for (std::size_t i = 0; i < text.size();) {
+        const auto lead = static_cast<unsigned char>(text[i]);
+        const std::size_t length = lead < 0x80 ? 1 : lead < 0xe0 ? 2 : lead < 0xf0 ? 3 : 4;
+        const std::string_view character = text.substr(i, length);
+        if (character.size() == length && simdjson::validate_utf8(character)) {
+            valid += character;
+            i += length;
+        } else {
+            valid += "\xef\xbf\xbd";
+            ++i;
+        }
+    }
+    return valid;
+}
+
+/// Collects the text.
+struct TextSink {
+    std::string text;
+    void put(char c) { text += c; }
+    void put(std::string_view part) { text += part; }
+};
+
+/// Counts its bytes only.
+struct CountingSink {
+    std::size_t count = 0;
+    void put(char) { ++count; }
+    void put(std::string_view part) { count += part.size(); }
+};
+
+template <class Sink> class JsonWriter {
+public:
+    JsonWriter(Sink& sink, JsonStyle style) : _sink(sink), _pretty(style == JsonStyle::Pretty) {}
+
+    void write(const Value& value)
+    {
+        switch (value.type()) {
+        case Value::Type::Null: return _sink.put("null");
+        case Value::Type::Bool: return _sink.put(*value.asBool() ? "true" : "false");
+        case Value::Type::Int: return writeNumber(*value.asInt());
+        case Value::Type::UInt: return writeNumber(*value.asUInt());
+        case Value::Type::Double: return writeReal(*value.asDouble());
+        case Value::Type::String: return writeString(*value.asString());
+        case Value::Type::Bytes: return writeBase64(value.asBytes()->view());
+        case Value::Type::Date: return writeReal(secondsSince1970(*value.asDate()));
+        case Value::Type::Array: return writeArray(*value.asArray());
+        case Value::Type::Dictionary: return writeDictionary(*value.asDictionary());
+        }
+    }
+
+private:
+    template <class Number> void writeNumber(Number number)
+    {
+        std::array<char, 32> digits;
+        const auto result = std::to_chars(digits.begin(), digits.end(), number);
+        _sink.put(std::string_view(digits.begin(), result.ptr));
+    }
+
+    void writeReal(double number) { std::isfinite(number) ? writeNumber(number) : _sink.put("null"); }
+
+    void writeString(std::string_view text)
+    {
+        if (simdjson::validate_utf8(text))
+            writeValidString(text);
+        else
+            writeValidString(repaired(text));
+    }
+
+    void writeValidString(std::string_view text)
+    {
+        _sink.put('"');
+        std::size_t begin = 0;
+        for (std::size_t i = 0; i < text.size(); ++i) {
+            const auto c = static_cast<unsigned char>(text[i]);
+            if (kEscapes[c] == Escape::None) continue;
+            _sink.put(text.substr(begin, i - begin));
+            begin = i + 1;
+            if (kEscapes[c] == Escape::Short) {
+                _sink.put('\\');
+                _sink.put(shortEscape(text[i]));
+            } else {
+                _sink.put(fmt::format("\\u{:04x}", c));
+            }
+        }
+        _sink.put(text.substr(begin));
+        _sink.put('"');
+    }
+
+    void writeBase64(std::string_view bytes)
+    {
+        constexpr std::size_t kChunk = 3 * 1024;
+        std::array<unsigned char, kChunk / 3 * 4 + 1> encoded;
+        _sink.put('"');
+        for (; !bytes.empty(); bytes.remove_prefix(std::min(kChunk, bytes.size()))) {
+            const int length = EVP_EncodeBlock(encoded.data(), reinterpret_cast<const unsigned char*>(bytes.data()),
+                                               static_cast<int>(std::min(kChunk, bytes.size())));
+            _sink.put(
+                std::string_view(reinterpret_cast<const char*>(encoded.data()), static_cast<std::size_t>(length)));
+        }
+        _sink.put('"');
+    }
+
+    void writeArray(const Value::Array& array)
+    {
+        writeContainer('[', ']', array, [this](const Value& element) { write(element); });
+    }
+
+    void writeDictionary(const Dictionary& dictionary)
+    {
+        writeContainer('{', '}', dictionary, [this](const Dictionary::Entry& entry) {
+            writeString(entry.first);
+            _sink.put(_pretty ? std::string_view(": ") : std::string_view(":"));
+            write(entry.second);
+        });
+    }
+
+    template <class Container, class WriteOne>
+    void writeContainer(char open, char close, const Container& container, WriteOne writeOne)
+    {
+        _sink.put(open);
+        ++_depth;
+        bool first = true;
+        for (const auto& item : container) {
+            if (!first) _sink.put(',');
+            first = false;
+            if (_pretty) newLine();
+            writeOne(item);
+        }
+        --_depth;
+        if (_pretty && !first) newLine();
+        _sink.put(close);
+    }
+
+    void newLine()
+    {
+        _sink.put('\n');
+        for (std::size_t i = 0; i < _depth; ++i) _sink.put("  ");
+    }
+
+    Sink& _sink;
+    const bool _pretty;
+    std::size_t _depth = 0;
+};
+
+} // namespace
+
+std::expected<Value, Error> parseJson(std::string_view text, std::size_t maximumSize)
+{
+    if (text.size() > maximumSize) return malformed(fmt::format("larger than {} bytes", maximumSize));
+    if (text.starts_with("\xef\xbb\xbf")) text.remove_prefix(3);
+
+    auto& parser = threadParser();
+    dom::element root;
+    std::expected<Value, Error> result;
+    if (const auto error = parser->parse(text.data(), text.size()).get(root))
+        result = malformed(simdjson::error_message(error));
+    else if (!convert(root, 0, *result))
+        result = malformed(fmt::format("nested deeper than {}", kMaximumDepth));
+    if (parser->capacity() > kKeptParserCapacity) parser.reset();
+    return result;
+}
+
+std::string toJson(const Value& value, JsonStyle style)
+{
+    TextSink sink;
+    JsonWriter(sink, style).write(value);
+    return std::move(sink.text);
+}
+
+std::size_t jsonSize(const Value& value)
+{
+    CountingSink sink;
+    JsonWriter(sink, JsonStyle::Compact).write(value);
+    return sink.count;
+}
+
+} // namespace platform

@@ -1,0 +1,142 @@
+#include <limits>
+
+#include <gtest/gtest.h>
+
+#include "platform/Error.h"
+#include "platform/Value.h"
+
+namespace platform {
+namespace {
+
+std::string arrays(std::size_t depth)
+{
+    return std::string(depth, '[') + std::string(depth, ']');
+}
+
+TEST(Json, ReadsEdgeCasesExactly)
+{
+    struct {
+        std::string_view text;
+        Value expected;
+    } const cases[] = {
+        {"\xef\xbb\xbf[1]", Value::Array{1}},
+        {R"({"a":1,"b":2,"a":3})", Value::dictionaryOf({{"a", 3}, {"b", 2}})},
+        {"-0", 0},
+        {"-0.0", -0.0},
+        {"1.0", 1.0},
+        {"-9223372036854775808", INT64_MIN},
+        {"9223372036854775808", std::uint64_t{1} << 63},
+        {"18446744073709551615", UINT64_MAX},
+        {"0.1000000000000000055511151231257827", 0.1},
+        {"2.2250738585072011e-308", 2.2250738585072011e-308},
+        {"5e-324", std::numeric_limits<double>::denorm_min()},
+        {"1.7976931348623157e308", std::numeric_limits<double>::max()},
+        {R"("\ud83d\ude00\u0000\/")", std::string_view("\xf0\x9f\x98\x80\0/", 6)},
+        {" null ", nullptr},
+        {"[]", Value::Array{}},
+        {"{}", Dictionary{}},
+    };
+    for (const auto& c : cases) {
+        const auto value = parseJson(c.text);
+        ASSERT_TRUE(value) << c.text << ": " << value.error().description();
+        EXPECT_EQ(*value, c.expected) << c.text;
+    }
+}
+
+TEST(Json, RefusesWhatIsNotJsonWithAReason)
+{
+    for (const std::string_view text : {"",
+                                        " ",
+                                        "\xef\xbb\xbf",
+                                        "nul",
+                                        "[1,]",
+                                        "{\"a\"}",
+                                        "{1:2}",
+                                        "[1] [2]",
+                                        "{}x",
+                                        "[1",
+                                        "\"a",
+                                        "\"\n\"",
+                                        "\"\xff\"",
+                                        "\"\xed\xa0\x80\"",
+                                        "\"\xc0\x80\"",
+                                        R"("\ud800")",
+                                        R"("\ud800\u0041")",
+                                        "18446744073709551616",
+                                        "-9223372036854775809",
+                                        "1e400",
+                                        "01",
+                                        "+1",
+                                        ".5",
+                                        "NaN",
+                                        "\xff\xfe[\0]\0"}) {
+        const auto value = parseJson(text);
+        ASSERT_FALSE(value) << text;
+        EXPECT_EQ(value.error().code, kFormatMalformed) << text;
+        EXPECT_NE(value.error().reason(), "") << text;
+    }
+}
+
+TEST(Json, BoundsDepthAndSize)
+{
+    EXPECT_TRUE(parseJson(arrays(kMaximumDepth)));
+    EXPECT_FALSE(parseJson(arrays(kMaximumDepth + 1)));
+    EXPECT_FALSE(parseJson(arrays(1'000'000)));
+    EXPECT_FALSE(parseJson(std::string(1'000'000, '[')));
+    EXPECT_TRUE(parseJson("[10]", 4));
+    EXPECT_FALSE(parseJson("[100]", 4));
+}
+
+TEST(Json, KeepsNothingOfALargeDocumentForTheNextOne)
+{
+    const Value large = Value::Array(100'000, Value("some text"));
+    EXPECT_EQ(parseJson(toJson(large)).value(), large);
+    EXPECT_FALSE(parseJson("[\"some text\""));
+    EXPECT_EQ(parseJson("[2]").value(), Value::Array{2});
+}
+
+TEST(Json, WritesEveryKindAsDocumented)
+{
+    struct {
+        Value value;
+        std::string_view expected;
+    } const cases[] = {
+        {nullptr, "null"},
+        {true, "true"},
+        {INT64_MIN, "-9223372036854775808"},
+        {UINT64_MAX, "18446744073709551615"},
+        {0.1, "0.1"},
+        {1e20, "1e+20"},
+        {std::numeric_limits<double>::infinity(), "null"},
+        {std::numeric_limits<double>::quiet_NaN(), "null"},
+        {Bytes("\xff\xfe\xfd\xfc"), "\"//79/A==\""},
+        {dateFromSecondsSince1970(1.5), "1.5"},
+        {std::string_view("a\"\\/\b\f\n\r\t\0\x1f\x7f\xc3\xa9", 14),
+         "\"a\\\"\\\\/\\b\\f\\n\\r\\t\\u0000\\u001f\x7f\xc3\xa9\""},
+        {"a\xff\xed\xa0\x80z\xe2\x82",
+         "\"a\xef\xbf\xbd\xef\xbf\xbd\xef\xbf\xbd\xef\xbf\xbdz\xef\xbf\xbd\xef\xbf\xbd\""},
+        {Value::dictionaryOf({{"z", Value::Array{1, nullptr}}, {"a", Dictionary()}}), R"({"z":[1,null],"a":{}})"},
+    };
+    for (const auto& c : cases) {
+        EXPECT_EQ(toJson(c.value), c.expected);
+        EXPECT_EQ(jsonSize(c.value), c.expected.size());
+    }
+    EXPECT_EQ(toJson(cases[std::size(cases) - 1].value, JsonStyle::Pretty),
+              "{\n  \"z\": [\n    1,\n    null\n  ],\n  \"a\": {}\n}");
+}
+
+TEST(Json, BytesLongerThanOneChunkStayOneBase64Text)
+{
+    const std::string json = toJson(Bytes(std::string(10'000, '\0')));
+    EXPECT_EQ(json, '"' + std::string(13'334, 'A') + "==\"");
+}
+
+TEST(Json, DoublesSurviveTheRoundTrip)
+{
+    for (const double number :
+         {1.0 / 3, 5e-324, 1.7976931348623157e308, 123456789.123456789, -2.5e-7, 9007199254740993.0})
+        EXPECT_EQ(parseJson(toJson(number))->asDouble(), number);
+}
+
+} // namespace
+} // namespace platform
