@@ -78,29 +78,39 @@ public:
     virtual void skip() = 0;
     /// Enters a record and answers its class name. `nextKey` then moves from key to key, and leaves at the end.
     virtual std::string beginRecord() = 0;
-    /// False at the end of the record, which is then left. The view lives until the next call.
+    /// False at the end of the record, which is then left. The view lives as long as what is decoded.
     virtual bool nextKey(std::string_view& name) = 0;
     /// Enters an array and answers a bound on its elements that is safe to reserve.
     virtual std::size_t beginArray() = 0;
     /// False at the end of the array, which is then left.
     virtual bool nextElement() = 0;
 
-    /// Stops decoding: "FIELD: REASON". The first failure counts.
+    /// Stops decoding. The first failure counts.
     void fail(std::string reason, std::int64_t code = kMalformed);
-    [[nodiscard]] bool failed() const { return _error.has_value(); }
-    [[nodiscard]] const std::optional<Error>& error() const { return _error; }
+    [[nodiscard]] bool failed() const { return _failure.has_value(); }
+    /// Whoever reads a field, or an element of an array, says after a failure where it happened, the innermost first.
+    void failedIn(std::string_view field);
+    void failedIn(std::size_t index);
+    /// The failure: "FIELD: REASON", with the whole way to the field: "results[2].score: expected a double, …".
+    [[nodiscard]] std::optional<Error> error() const;
     [[nodiscard]] const RecordClasses& classes() const { return _classes; }
 
     /// Codes of the errors made here, in kFormatErrorDomain.
-    static constexpr std::int64_t kMalformed = 1;
-    static constexpr std::int64_t kUnknownClass = 2;
+    static constexpr std::int64_t kMalformed = kFormatMalformed;
+    static constexpr std::int64_t kUnknownClass = kFormatUnknownClass;
 
-    /// The key being read, for error texts. Record.cpp keeps it.
-    std::string path;
+protected:
+    /// Fails because `expected` ("an integer") was to be read where there is a value of type `found`.
+    void failExpecting(std::string_view expected, Value::Type found);
 
 private:
+    struct Failure {
+        std::string place; ///< of the value that could not be read, as far as it is known
+        std::string reason;
+        std::int64_t code;
+    };
     const RecordClasses& _classes;
-    std::optional<Error> _error;
+    std::optional<Failure> _failure;
 };
 
 /// Base of every record.
@@ -169,7 +179,7 @@ void encodeError(Encoder& encoder, const Error& error);
 template <class T> void encodeValue(Encoder& encoder, const T& value)
 {
     if constexpr (std::is_same_v<T, bool>) encoder.boolean(value);
-    else if constexpr (std::is_enum_v<T>) encoder.integer(static_cast<std::int64_t>(value));
+    else if constexpr (std::is_enum_v<T>) encodeValue(encoder, static_cast<std::underlying_type_t<T>>(value));
     else if constexpr (std::is_integral_v<T> && std::is_signed_v<T>) encoder.integer(value);
     else if constexpr (std::is_integral_v<T>) encoder.unsignedInteger(value);
     else if constexpr (std::is_floating_point_v<T>) encoder.real(value);
@@ -198,8 +208,11 @@ template <class T> void decodeValue(Decoder& decoder, T& value)
     } else if constexpr (std::is_same_v<T, Value>) value = decoder.value();
     else if (decoder.null()) value = T{};
     else if constexpr (std::is_same_v<T, bool>) value = decoder.boolean();
-    else if constexpr (std::is_enum_v<T>) value = static_cast<T>(decoder.integer());
-    else if constexpr (std::is_integral_v<T> && std::is_signed_v<T>) {
+    else if constexpr (std::is_enum_v<T>) {
+        std::underlying_type_t<T> number{};
+        decodeValue(decoder, number);
+        value = static_cast<T>(number);
+    } else if constexpr (std::is_integral_v<T> && std::is_signed_v<T>) {
         const std::int64_t number = decoder.integer();
         value = static_cast<T>(number);
         if (value != number) decoder.fail("number out of range");
@@ -228,6 +241,7 @@ template <class T> void decodeValue(Decoder& decoder, T& value)
             if constexpr (IsShared<typename T::value_type>::value) {
                 if (!value.back()) decoder.fail("missing record");
             }
+            if (decoder.failed()) return decoder.failedIn(value.size() - 1);
         }
     } else { // Url
         auto url = T::parse(decoder.string());
@@ -274,9 +288,10 @@ public:
 };
 
 /// A record as a dictionary with its class under "class": the form that crosses IPC as a{sv}. Null fields and empty
-/// arrays are left out.
+/// arrays of records or plain values are left out.
 [[nodiscard]] Value toValue(const Record& record);
-/// The record in such a dictionary.
+/// The record in such a dictionary. A date may be a number, seconds since 1970, as IPC messages have them. Records may
+/// nest `kMaximumDepth` deep, here and in archives; so may a field of type Value in itself.
 [[nodiscard]] Result<std::shared_ptr<Record>> recordFromValue(const Value& value, const RecordClasses& classes);
 
 /// A record as a MessagePack archive, the form that is stored.

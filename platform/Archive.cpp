@@ -1,0 +1,364 @@
+#include <array>
+#include <bit>
+
+#include <fmt/format.h>
+#include <msgpack.hpp>
+
+#include "platform/Record.h"
+
+/// Archives: MessagePack. A record is a map whose first key is "class"; a date is a timestamp, the extension type -1.
+namespace platform {
+
+namespace {
+
+constexpr std::string_view kClassKey = "class";
+constexpr std::int8_t kTimestamp = -1;
+constexpr std::int64_t kNanosecondsPerSecond = 1'000'000'000;
+
+// Writing
+
+class ArchiveEncoder final : public Encoder {
+public:
+    void beginRecord(std::string_view className, std::size_t fieldCount) override
+    {
+        _packer.pack_map(static_cast<std::uint32_t>(fieldCount + 1));
+        packText(kClassKey);
+        packText(className);
+    }
+    void key(std::string_view name) override { packText(name); }
+    void endRecord() override {}
+    void beginArray(std::size_t count) override { _packer.pack_array(static_cast<std::uint32_t>(count)); }
+    void endArray() override {}
+    void null() override { _packer.pack_nil(); }
+    void boolean(bool value) override { value ? _packer.pack_true() : _packer.pack_false(); }
+    void integer(std::int64_t value) override { _packer.pack_int64(value); }
+    void unsignedInteger(std::uint64_t value) override { _packer.pack_uint64(value); }
+    void real(double value) override
+    {
+        // The packer would write a whole number as an integer, and the value would come back as another type.
+        std::array<char, 9> number{'\xcb'};
+        store(number.data() + 1, std::bit_cast<std::uint64_t>(value));
+        _buffer.write(number.data(), number.size());
+    }
+    void string(std::string_view value) override { packText(value); }
+    void bytes(const Bytes& value) override
+    {
+        _packer.pack_bin(static_cast<std::uint32_t>(value.size()));
+        _packer.pack_bin_body(value.data(), static_cast<std::uint32_t>(value.size()));
+    }
+    void date(Date value) override
+    {
+        // The 96-bit form holds every date.
+        const std::int64_t count = value.time_since_epoch().count();
+        const std::int64_t rest = count % kNanosecondsPerSecond;
+        const std::int64_t seconds = count / kNanosecondsPerSecond - (rest < 0 ? 1 : 0);
+        std::array<char, 12> body;
+        store(body.data(), static_cast<std::uint32_t>(rest < 0 ? rest + kNanosecondsPerSecond : rest));
+        store(body.data() + 4, static_cast<std::uint64_t>(seconds));
+        _packer.pack_ext(body.size(), kTimestamp);
+        _packer.pack_ext_body(body.data(), body.size());
+    }
+    void value(const Value& value) override
+    {
+        switch (value.type()) {
+        case Value::Type::Null: return null();
+        case Value::Type::Bool: return boolean(*value.asBool());
+        case Value::Type::Int: return integer(*value.asInt());
+        case Value::Type::UInt: return unsignedInteger(*value.asUInt());
+        case Value::Type::Double: return real(*value.asDouble());
+        case Value::Type::String: return string(*value.asString());
+        case Value::Type::Bytes: return bytes(*value.asBytes());
+        case Value::Type::Date: return date(*value.asDate());
+        case Value::Type::Array:
+            beginArray(value.count());
+            for (const Value& element : *value.asArray()) this->value(element);
+            return;
+        case Value::Type::Dictionary:
+            _packer.pack_map(static_cast<std::uint32_t>(value.count()));
+            for (const auto& [name, entry] : *value.asDictionary()) {
+                packText(name);
+                this->value(entry);
+            }
+            return;
+        }
+    }
+
+    [[nodiscard]] std::string take() const { return {_buffer.data(), _buffer.size()}; }
+
+private:
+    void packText(std::string_view text)
+    {
+        _packer.pack_str(static_cast<std::uint32_t>(text.size()));
+        _packer.pack_str_body(text.data(), static_cast<std::uint32_t>(text.size()));
+    }
+
+    template <class Number> static void store(char* to, Number number)
+    {
+        for (std::size_t i = sizeof(Number); i > 0; number = static_cast<Number>(number >> 8))
+            to[--i] = static_cast<char>(number & 0xff);
+    }
+
+    msgpack::sbuffer _buffer;
+    msgpack::packer<msgpack::sbuffer> _packer{_buffer};
+};
+
+// Reading
+
+/// One value of an archive, or the head of a container, whose contents follow it.
+struct Token {
+    Value::Type type = Value::Type::Null;
+    std::uint32_t size = 0; ///< bytes of a string or bytes; elements of an array; entries of a dictionary
+    union {
+        std::int64_t integer = 0; ///< of a date: nanoseconds since 1970
+        bool boolean;
+        std::uint64_t unsignedInteger;
+        double real;
+        const char* bytes; ///< in the archive
+    };
+
+    [[nodiscard]] std::string_view text() const { return {bytes, size}; }
+    /// How many values follow that belong to this one.
+    [[nodiscard]] std::uint64_t contents() const
+    {
+        return type == Value::Type::Array ? size : type == Value::Type::Dictionary ? std::uint64_t{size} * 2 : 0;
+    }
+};
+
+/// Big-endian number of `width` bytes.
+std::uint64_t load(const char* from, std::size_t width)
+{
+    std::uint64_t number = 0;
+    for (std::size_t i = 0; i < width; ++i) number = number << 8 | static_cast<unsigned char>(from[i]);
+    return number;
+}
+
+/// Splits an archive into its tokens. A token stands for at least one byte of the archive, and once parsing has
+/// succeeded every container has as many values as it declares.
+struct Tokenizer : msgpack::null_visitor {
+    std::vector<Token> tokens;
+    const char* failure = nullptr;
+
+    bool visit_nil() { return add({}); }
+    bool visit_boolean(bool value) { return add({.type = Value::Type::Bool, .boolean = value}); }
+    bool visit_positive_integer(std::uint64_t value)
+    {
+        if (value > INT64_MAX) return add({.type = Value::Type::UInt, .unsignedInteger = value});
+        return add({.type = Value::Type::Int, .integer = static_cast<std::int64_t>(value)});
+    }
+    bool visit_negative_integer(std::int64_t value) { return add({.type = Value::Type::Int, .integer = value}); }
+    bool visit_float32(float value) { return visit_float64(double{value}); }
+    bool visit_float64(double value) { return add({.type = Value::Type::Double, .real = value}); }
+    bool visit_str(const char* text, std::uint32_t size)
+    {
+        return add({.type = Value::Type::String, .size = size, .bytes = text});
+    }
+    bool visit_bin(const char* bytes, std::uint32_t size)
+    {
+        return add({.type = Value::Type::Bytes, .size = size, .bytes = bytes});
+    }
+    bool start_array(std::uint32_t count) { return add({.type = Value::Type::Array, .size = count}); }
+    bool start_map(std::uint32_t count) { return add({.type = Value::Type::Dictionary, .size = count}); }
+
+    /// `size` counts the type byte at `body`, too.
+    bool visit_ext(const char* body, std::uint32_t size)
+    {
+        if (size == 0 || static_cast<std::int8_t>(*body) != kTimestamp) return fail("unknown extension type");
+        ++body;
+        std::int64_t seconds = 0;
+        std::uint64_t nanoseconds = 0;
+        if (size == 1 + 4) {
+            seconds = static_cast<std::int64_t>(load(body, 4));
+        } else if (size == 1 + 8) {
+            seconds = static_cast<std::int64_t>(load(body, 8) & ((std::uint64_t{1} << 34) - 1));
+            nanoseconds = load(body, 8) >> 34;
+        } else if (size == 1 + 12) {
+            nanoseconds = load(body, 4);
+            seconds = static_cast<std::int64_t>(load(body + 4, 8));
+        } else {
+            return fail("broken date");
+        }
+        const __int128 total = static_cast<__int128>(seconds) * kNanosecondsPerSecond + nanoseconds;
+        if (nanoseconds >= kNanosecondsPerSecond || total < INT64_MIN || total > INT64_MAX)
+            return fail("date out of range");
+        return add({.type = Value::Type::Date, .integer = static_cast<std::int64_t>(total)});
+    }
+
+    void parse_error(std::size_t, std::size_t) { fail("not an archive"); }
+    void insufficient_bytes(std::size_t, std::size_t) { fail("truncated"); }
+
+private:
+    bool add(Token token)
+    {
+        tokens.push_back(token);
+        return true;
+    }
+    bool fail(const char* reason)
+    {
+        failure = reason;
+        return false;
+    }
+};
+
+class ArchiveDecoder final : public Decoder {
+public:
+    /// `archive` must outlive the decoder.
+    ArchiveDecoder(std::string_view archive, const RecordClasses& classes) : Decoder(classes)
+    {
+        Tokenizer tokenizer;
+        tokenizer.tokens.reserve(archive.size() / 8 + 1);
+        std::size_t end = 0;
+        if (!msgpack::parse(archive.data(), archive.size(), end, tokenizer))
+            fail(tokenizer.failure);
+        else if (end != archive.size())
+            fail("trailing bytes");
+        else
+            _tokens = std::move(tokenizer.tokens);
+    }
+
+    bool null() override { return !failed() && here().type == Value::Type::Null && (++_next, true); }
+    bool boolean() override { return take(Value::Type::Bool, "a boolean").boolean; }
+    std::int64_t integer() override
+    {
+        if (here().type == Value::Type::UInt) fail("number out of range");
+        return take(Value::Type::Int, "an integer").integer;
+    }
+    std::uint64_t unsignedInteger() override
+    {
+        if (here().type == Value::Type::UInt) return take(Value::Type::UInt, "an integer").unsignedInteger;
+        if (here().type == Value::Type::Int && here().integer < 0) fail("number out of range");
+        return take(Value::Type::Int, "an integer").unsignedInteger;
+    }
+    double real() override
+    {
+        if (here().type == Value::Type::Int) return static_cast<double>(take(Value::Type::Int, "a double").integer);
+        if (here().type == Value::Type::UInt)
+            return static_cast<double>(take(Value::Type::UInt, "a double").unsignedInteger);
+        return take(Value::Type::Double, "a double").real;
+    }
+    std::string string() override { return std::string(take(Value::Type::String, "a string").text()); }
+    Bytes bytes() override { return Bytes(std::string(take(Value::Type::Bytes, "bytes").text())); }
+    Date date() override { return Date(Duration(take(Value::Type::Date, "a date").integer)); }
+    Value value() override { return value(0); }
+
+    void skip() override
+    {
+        for (std::uint64_t left = failed() ? 0 : 1; left > 0; --left) left += _tokens[_next++].contents();
+    }
+
+    std::string beginRecord() override
+    {
+        const std::uint32_t size = here().size;
+        take(Value::Type::Dictionary, "a record");
+        if (!failed() && (size == 0 || take(Value::Type::String, "a key").text() != kClassKey))
+            fail("record without a class");
+        const std::string_view className = take(Value::Type::String, "a class name").text();
+        enter(size - 1);
+        return std::string(className);
+    }
+
+    bool nextKey(std::string_view& name) override
+    {
+        if (!nextElement()) return false;
+        name = take(Value::Type::String, "a key").text();
+        return !failed();
+    }
+
+    std::size_t beginArray() override
+    {
+        const std::uint32_t size = take(Value::Type::Array, "an array").size;
+        enter(size);
+        return size;
+    }
+
+    bool nextElement() override
+    {
+        if (failed()) return false;
+        if (_left.back() > 0) return _left.back()-- > 0;
+        _left.pop_back();
+        return false;
+    }
+
+private:
+    [[nodiscard]] const Token& here() const
+    {
+        static constexpr Token kNothing{};
+        return failed() ? kNothing : _tokens[_next];
+    }
+
+    /// The token at hand, which must be of that type; an empty one after a failure.
+    Token take(Value::Type type, std::string_view expected)
+    {
+        const Token token = here();
+        if (token.type != type) failExpecting(expected, token.type);
+        if (failed()) return {};
+        ++_next;
+        return token;
+    }
+
+    /// Enters a container of `size` elements or fields.
+    void enter(std::uint32_t size)
+    {
+        if (_left.size() == kMaximumDepth) fail("nested too deep");
+        _left.push_back(size);
+    }
+
+    Value value(std::size_t depth)
+    {
+        const Token token = here();
+        if (failed()) return {};
+        if (token.type >= Value::Type::Array && depth == kMaximumDepth) {
+            fail("nested too deep");
+            return {};
+        }
+        ++_next;
+        switch (token.type) {
+        case Value::Type::Null: return {};
+        case Value::Type::Bool: return token.boolean;
+        case Value::Type::Int: return token.integer;
+        case Value::Type::UInt: return token.unsignedInteger;
+        case Value::Type::Double: return token.real;
+        case Value::Type::String: return token.text();
+        case Value::Type::Bytes: return Bytes(std::string(token.text()));
+        case Value::Type::Date: return Date(Duration(token.integer));
+        case Value::Type::Array: {
+            Value::Array array;
+            array.reserve(token.size);
+            for (std::uint32_t i = 0; i < token.size; ++i) array.push_back(value(depth + 1));
+            return array;
+        }
+        case Value::Type::Dictionary: {
+            Dictionary dictionary;
+            dictionary.reserve(token.size);
+            for (std::uint32_t i = 0; i < token.size; ++i) {
+                std::string key = string();
+                dictionary.set(std::move(key), value(depth + 1));
+            }
+            return dictionary;
+        }
+        }
+        return {};
+    }
+
+    std::vector<Token> _tokens;
+    std::size_t _next = 0;
+    std::vector<std::uint32_t> _left; ///< what is left to read of each container that was entered
+};
+
+} // namespace
+
+std::string archive(const Record& record)
+{
+    ArchiveEncoder encoder;
+    encodeRecord(encoder, record);
+    return encoder.take();
+}
+
+Result<std::shared_ptr<Record>> unarchive(std::string_view bytes, const RecordClasses& classes)
+{
+    ArchiveDecoder decoder(bytes, classes);
+    auto record = decodeRecord(decoder);
+    if (auto error = decoder.error()) return std::unexpected(std::move(*error));
+    return record;
+}
+
+} // namespace platform
