@@ -1,6 +1,10 @@
 #include "CoreTavrin/TAVRecordClasses.h"
 
+#include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVFeedback.h"
+#include "CoreTavrin/TAVReply.h"
+#include "CoreTavrin/TAVRequest.h"
+#include "CoreTavrin/TAVSessionConfiguration.h"
 #include "searchrecords/ZRRecords.h"
 
 namespace tavrin {
@@ -12,6 +16,10 @@ const platform::RecordClasses& coreRecordClasses()
         all.addAll(platform::RecordClasses::of<TAVSkipSearchFeedback, TAVLookupStartNetworkSearchFeedback,
                                                TAVEndNetworkSearchFeedback, TAVRankerFeedback, TAVCacheHitFeedback,
                                                TAVSearchSuggestion, TAVCustomSearchResult, TAVPunchout>());
+        all.addAll(platform::RecordClasses::of<TAVSessionConfiguration, TAVRequest, TAVSearchRequest, TAVZeroKeywordRequest,
+                                               TAVMoreResultsRequest, TAVCardRequest, TAVLookupRequest,
+                                               TAVFlightLookupRequest, TAVFlightSearchRequest, TAVQueryItem, TAVReply,
+                                               TAVHTTPRequest, TAVHTTPResponse, TAVBagRecord>());
         return all;
     }();
     return classes;

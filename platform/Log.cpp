@@ -40,6 +40,7 @@ std::shared_ptr<spdlog::logger>& sink()
 std::mutex tapMutex;
 std::function<void(const LogLine&)> tap; // under tapMutex
 std::atomic<bool> tapped = false;
+std::atomic<LogLevel> sinkThreshold = LogLevel::Debug; // the lowest level for the sink, while a tap wants all
 
 /// Texts come from outside too: a newline in a URL must not begin a line of its own.
 std::string withoutControlCharacters(std::string text)
@@ -75,6 +76,7 @@ void Log::emit(LogLevel level, std::string text) const
         std::lock_guard lock(tapMutex);
         if (tap) tap({level, _subsystem, _category, text});
     }
+    if (level < sinkThreshold) return;
     sink()->log(spdlogLevel(level), "{:<7} [{}] {}", logLevelName(level), _category, text);
 }
 
@@ -92,6 +94,7 @@ LogTap::LogTap(std::function<void(const LogLine&)> newTap) : _previousThreshold(
     std::lock_guard lock(tapMutex);
     tap = std::move(newTap);
     tapped = true;
+    sinkThreshold = _previousThreshold;
     Log::threshold = LogLevel::Debug;
 }
 
@@ -100,6 +103,7 @@ LogTap::~LogTap()
     std::lock_guard lock(tapMutex);
     tap = nullptr;
     tapped = false;
+    sinkThreshold = LogLevel::Debug;
     Log::threshold = _previousThreshold;
 }
 
