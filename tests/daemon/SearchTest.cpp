@@ -162,7 +162,7 @@ TEST_F(SearchTest, TransportErrorsReachTheClientAndTheSession)
 
 TEST_F(SearchTest, ABagWithoutSearchUrlIsAnError)
 {
-    start();
+    startWithoutBag();
     deliverBag("{}");
     auto connection = client();
     auto call = search(*connection, 1, "weat");
@@ -173,7 +173,7 @@ TEST_F(SearchTest, ABagWithoutSearchUrlIsAnError)
 TEST_F(SearchTest, MessagesKeepTheirPlaceToThemselves)
 {
     device.location.allowed = {"wifi"};
-    start();
+    startWithoutBag();
     deliverBag(R"({"searchURL": "https://s.example/", "supportedGeoLocationSources": ["wifi"]})");
     device.location.moveTo(platform::Location{1, 2, "wifi"});
     auto messages = client("com.quorvane.messages", "MESSAGES/1");
@@ -209,7 +209,7 @@ TEST_F(SearchTest, TheServiceMayForceANewBag)
 // Before there is a bag, a connection's requests wait for it, in their order, one second at most.
 TEST_F(SearchTest, WaitsASecondForTheFirstBag)
 {
-    start();
+    startWithoutBag();
     auto connection = client();
     auto first = search(*connection, 1, "weat");
     auto bag = connection->call("Bag");
@@ -231,7 +231,7 @@ TEST_F(SearchTest, WaitsASecondForTheFirstBag)
 
 TEST_F(SearchTest, FiveHundredWaitersEachHaveTheirSecond)
 {
-    start();
+    startWithoutBag();
     std::vector<std::shared_ptr<FakeConnection>> connections;
     std::vector<std::shared_ptr<FakeCall>> calls;
     for (int i = 0; i < 500; ++i) {
@@ -248,7 +248,7 @@ TEST_F(SearchTest, FiveHundredWaitersEachHaveTheirSecond)
 
 TEST_F(SearchTest, TheBagsArrivalWakesEveryWaiterOfAClient)
 {
-    start();
+    startWithoutBag();
     auto one = client("com.quorvane.vistrel", "Vistrel/4", 1);
     auto two = client("com.quorvane.vistrel", "Vistrel/4", 2);
     auto first = search(*one, 1, "weat");

@@ -59,6 +59,13 @@ struct DaemonTest : testing::Test {
         device.drain();
     }
 
+    /// Starts without a bag on disk, so that the first one must be fetched.
+    void startWithoutBag()
+    {
+        device.files.files.clear();
+        start();
+    }
+
     Assembly& assembly() { return daemon->assembly; }
 
     /// Requests of the foreground session, in order; the first is the bag's.
