@@ -53,12 +53,22 @@ struct Interface {
     std::string_view introspection;     ///< the XML that Introspect answers, whole
 };
 
-/// Limits of one connection. Past the first, calls wait in the socket; past the others the connection is dropped (a
-/// message over `messageSize` gets the error LimitsExceeded and is not looked at).
+/// Limits against a peer that is broken or hostile: it is answered with an error, waits or is dropped, and nobody else
+/// notices. Bytes are those of the arguments; a value counts for 8 at least.
 struct Limits {
-    std::size_t messageSize = 8u << 20;      ///< bytes of one incoming message
-    unsigned callsInFlight = 256;            ///< calls not yet answered
-    std::size_t queuedBytes = 32u << 20;     ///< bytes waiting for a peer that doesn't read
+    /// Bytes of one incoming message. A larger one gets the error LimitsExceeded and is not looked at.
+    std::size_t messageSize = 8u << 20;
+    /// Calls not yet answered, and their bytes. Past either, further calls wait in the socket.
+    unsigned callsInFlight = 256;
+    std::size_t bytesInFlight = 32u << 20;
+    /// Bytes waiting for a peer that doesn't read. Past a quarter its calls wait in the socket; past the whole the
+    /// connection is dropped. A single message may be larger.
+    std::size_t queuedBytes = 32u << 20;
+    /// Connections open at once on one listener, so that no client takes all descriptors. Past it, new ones wait to be
+    /// accepted until one closes.
+    unsigned connections = 256;
+    /// How long a new peer may take to authenticate, and a closing one to read what was sent before.
+    Duration patience = std::chrono::seconds(30);
 };
 
 /// Error of a call that could not be decoded; becomes a D-Bus error with this text. The connection lives on.
@@ -79,8 +89,9 @@ struct Peer {
 
 /// The server's end of one connection. Any thread.
 ///
-/// Life: made by its listener, `resume()`d by the acceptor, invalidated once: by the peer's end, by a limit, or by
-/// `invalidate()`. After that no call arrives, pushes go nowhere, and answers to calls are dropped.
+/// Life: made by its listener, `resume()`d by the acceptor, invalidated once: by the peer's end, by a limit, by
+/// `invalidate()`, or by its owner's letting go of it. Calls that the peer made before it went still arrive; after
+/// `invalidate()` none does. Then pushes go nowhere and answers to calls are dropped.
 class Connection {
 public:
     virtual ~Connection() = default;
@@ -140,7 +151,8 @@ namespace ipc {
 inline constexpr const char* kObjectPath = "/com/quorvane/tavrind";
 
 /// Listens in `directory`; sweeps endpoints left there by earlier processes when made. `label` of a listener names the
-/// connections' queues. The run loop, executor and clock must outlive it.
+/// connections' queues. The run loop, executor and clock must outlive it and what it made. Destroying it, on the loop's
+/// thread or once the loop has stopped, ends all connections.
 [[nodiscard]] std::unique_ptr<Transport> makeBusTransport(RunLoop& runLoop, Executor& executor, Clock& clock,
                                                           std::filesystem::path directory, Limits limits = {});
 

@@ -1,0 +1,557 @@
+#include "platform/Ipc.h"
+
+#include <condition_variable>
+#include <cstdlib>
+#include <deque>
+#include <future>
+#include <sys/mman.h>
+#include <sys/resource.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
+#include <sys/un.h>
+#include <thread>
+#include <unistd.h>
+
+#include <gmock/gmock.h>
+#include <systemd/sd-bus.h>
+
+#include "platform/ListenSocket.h"
+#include "platform/Log.h"
+#include "platform/RunLoop.h"
+#include "tests/support/ManualClock.h"
+
+namespace platform::ipc {
+namespace {
+
+using namespace std::chrono_literals;
+using testing::HasSubstr;
+
+constexpr Duration kLong = 60s; // only a failing test waits this long
+constexpr std::size_t kBeyondSocketBuffers = 20 << 20; // sd-bus asks for 8 MiB
+constexpr std::string_view kEveryType = "sxtuibdaya{sv}aa{sv}asah";
+
+const Interface& probe()
+{
+    static const Interface interface{
+        .name = "com.example.Probe",
+        .methods = {{"Echo", kEveryType, kEveryType},
+                    {"Take", "a{sv}", "a{sv}"},
+                    {"Note", "s", "", true},
+                    {"Hold", "", "s"},
+                    {"Batch", "", "ay"},
+                    {"Give", "t", "ay"},
+                    {"Bye", "t", "ay"},
+                    {"Fail", "", "s"},
+                    {"Misfit", "", "s"},
+                    {"Count", "", "u", false, "com.example.Extra"}},
+        .listenerName = "com.example.Listener",
+        .signals = {{"Told", "sa{sv}", ""}},
+        .introspection = "<node><interface name=\"com.example.Probe\"><method name=\"Hold\"/></interface></node>",
+    };
+    return interface;
+}
+
+const Member& method(std::string_view name)
+{
+    return *std::ranges::find(probe().methods, name, &Member::name);
+}
+
+/// A directory for one test, removed afterwards.
+struct TemporaryDirectory {
+    TemporaryDirectory() { path = mkdtemp(path.data()); }
+    ~TemporaryDirectory() { std::filesystem::remove_all(path); }
+    std::string path = "/tmp/ipc-test-XXXXXX";
+};
+
+/// A service with a probe object on every connection, its loop on a thread.
+class Service {
+public:
+    explicit Service(Limits limits = {}) : _limits(limits)
+    {
+        failOnReplyMisuse();
+        transport = makeBusTransport(loop, pool, clock, directory(), limits);
+        listener = std::move(*transport->listen(probe(), "com.example.probe"));
+        serve(*listener);
+        _thread = std::thread([this] { loop.run(); });
+    }
+    ~Service()
+    {
+        loop.stop();
+        _thread.join();
+        for (Responder& reply : held) reply.abandon();
+        connections.clear();
+        listener.reset();
+    }
+
+    std::string directory() const { return _directory.path + "/service"; }
+
+    void serve(Listener& on)
+    {
+        on.setAcceptor([this](const std::shared_ptr<Connection>& connection) {
+            connection->exportObject(
+                [this, weak = std::weak_ptr(connection)](auto member, Message arguments, Responder reply) {
+                    if (auto living = weak.lock())
+                        handle(*living, member, std::move(arguments), std::move(reply));
+                    else
+                        reply.abandon();
+                });
+            connection->setInvalidationHandler([this] { note("<invalidated>"); });
+            connection->resume();
+            std::lock_guard lock(mutex);
+            connections.push_back(connection);
+            changed.notify_all();
+        });
+        on.resume();
+    }
+
+    /// Waits until `holds` does, which is called under the mutex.
+    void await(const std::function<bool()>& holds)
+    {
+        std::unique_lock lock(mutex);
+        ASSERT_TRUE(changed.wait_for(lock, kLong, holds));
+    }
+    /// Waits until the loop has run what it was given so far.
+    void settle()
+    {
+        std::promise<void> done;
+        loop.execute(Priority::Default, [&] { done.set_value(); });
+        done.get_future().wait();
+    }
+    std::unique_ptr<Client> connect(const Listener& to) { return std::move(*Client::connect(to.endpoint(), kLong)); }
+    std::unique_ptr<Client> connect() { return connect(*listener); }
+
+    RunLoop loop;
+    test::ManualClock clock;
+    std::mutex mutex;
+    std::condition_variable changed;
+    std::vector<std::shared_ptr<Connection>> connections;
+    std::vector<std::string> notes;
+    std::vector<Responder> held;
+    std::size_t mostHeld = 0;
+    WorkerPool pool{2};
+    std::unique_ptr<Transport> transport;
+    std::unique_ptr<Listener> listener;
+
+private:
+    void note(std::string text)
+    {
+        std::lock_guard lock(mutex);
+        notes.push_back(std::move(text));
+        changed.notify_all();
+    }
+
+    void handle(Connection& connection, std::string_view member, Message arguments, Responder reply)
+    {
+        connection.queue()->assertOnQueue();
+        if (member == "Echo" || member == "Take") return reply(std::move(arguments));
+        if (member == "Fail") return reply(std::unexpected(CallError{.message = "scale: not a number \xff"}));
+        if (member == "Misfit") return reply(Message{{1.5}, {}});
+        if (member == "Count") return reply(Message{{7}, {}});
+        if (member == "Note") {
+            note(*arguments.args[0].asString());
+            return reply(Message{});
+        }
+        if (member == "Give" || member == "Bye") {
+            reply(Message{{Bytes(std::string(*arguments.args[0].asUInt(), 'x'))}, {}});
+            if (member == "Bye") connection.invalidate();
+            return;
+        }
+        std::lock_guard lock(mutex);
+        held.push_back(std::move(reply));
+        mostHeld = std::max(mostHeld, held.size());
+        if (member == "Batch" && held.size() == _limits.callsInFlight)
+            for (Responder& owed : std::exchange(held, {})) owed(Message{{Bytes(std::string(1000, 'x'))}, {}});
+        changed.notify_all();
+    }
+
+    const Limits _limits;
+    TemporaryDirectory _directory;
+    std::thread _thread;
+};
+
+CallResult call(Client& client, const Member& member, Message arguments = {}, std::string_view interface = probe().name)
+{
+    std::optional<CallResult> got;
+    client.call(interface, member, std::move(arguments), [&](CallResult result) { got = std::move(result); });
+    if (client.wait([&] { return got.has_value(); }, kLong)) return std::move(*got);
+    return std::unexpected(CallError{"test.Gone", "the connection ended"});
+}
+
+/// A connected socket that speaks no D-Bus.
+FileHandle rawConnection(const Service& service)
+{
+    FileHandle socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    sockaddr_un address{AF_UNIX, {}};
+    std::strcpy(address.sun_path, (service.directory() + "/socket").c_str());
+    EXPECT_EQ(connect(socket.fd(), reinterpret_cast<sockaddr*>(&address), sizeof(address)), 0) << strerror(errno);
+    return socket;
+}
+
+bool readsUntilEnd(int fd)
+{
+    char buffer[256];
+    ssize_t got = 1;
+    while (got > 0) got = read(fd, buffer, sizeof(buffer));
+    return got == 0 || errno == ECONNRESET;
+}
+
+std::string commandOutput(const std::string& command)
+{
+    std::string output;
+    FILE* pipe = popen((command + " 2>&1").c_str(), "r");
+    char buffer[4096];
+    while (const std::size_t got = fread(buffer, 1, sizeof(buffer), pipe)) output.append(buffer, got);
+    pclose(pipe);
+    return output;
+}
+
+TEST(Ipc, EveryTypeSurvivesTheRoundTrip)
+{
+    Service service;
+    auto client = service.connect();
+    Value nested = Dictionary{{"leaf", "x"}};
+    for (int depth = 0; depth < 32; ++depth) nested = Value::dictionaryOf({{"inner", nested}});
+    const Value values = Dictionary{{"bool", true},
+                                    {"int", -5},
+                                    {"max", UINT64_MAX},
+                                    {"double", 0.1},
+                                    {"text", "gr\u00fc\u00df"},
+                                    {"bytes", Bytes(std::string("\0\xff", 2))},
+                                    {"list", Value::Array{1, "two", Dictionary()}},
+                                    {"nested", nested},
+                                    {"date", dateFromSecondsSince1970(1.5)},
+                                    {"nothing", nullptr}};
+    Message sent;
+    sent.handles.emplace_back(memfd_create("handle", MFD_CLOEXEC));
+    ASSERT_EQ(write(sent.handles[0].fd(), "through", 7), 7);
+    sent.args = {"a\xffz",
+                 INT64_MIN,
+                 UINT64_MAX,
+                 UINT32_MAX,
+                 INT32_MIN,
+                 true,
+                 1e300,
+                 Bytes(std::string(1 << 20, '\0')),
+                 values,
+                 Value::Array{values, Dictionary()},
+                 Value::Array{"p", ""},
+                 Value::Array{0}};
+    Value::Array expected = sent.args;
+    Value travelled = values;
+    travelled.mutableDictionary().set("date", 1.5);
+    travelled.mutableDictionary().remove("nothing");
+    expected[0] = "a\ufffdz";
+    expected[8] = travelled;
+    expected[9] = Value::Array{travelled, Dictionary()};
+
+    auto got = call(*client, method("Echo"), std::move(sent));
+    ASSERT_TRUE(got) << got.error().message;
+    EXPECT_EQ(Value(got->args), Value(expected)) << toJson(got->args) << "\n" << toJson(expected);
+    ASSERT_EQ(got->handles.size(), 1u);
+    char contents[8] = {};
+    EXPECT_EQ(pread(got->handles[0].fd(), contents, 7, 0), 7);
+    EXPECT_STREQ(contents, "through");
+}
+
+TEST(Ipc, BadCallsAreAnsweredWithAnErrorThatNamesTheFaultAndTheConnectionLivesOn)
+{
+    Service service({.messageSize = 1 << 20});
+    auto client = service.connect();
+    Value deep = "leaf";
+    for (int depth = 0; depth < 40; ++depth) deep = Value::Array{deep};
+    for (int depth = 0; depth < 40; ++depth) deep = Value::dictionaryOf({{"k", deep}});
+    const struct {
+        Member member;
+        Value::Array args;
+        std::string name, text;
+        std::string_view interface = probe().name;
+    } cases[] = {
+        {{"Take", "s", "s"}, {"text"}, SD_BUS_ERROR_INVALID_ARGS, "takes \"a{sv}\", not \"s\""},
+        {{"Nothing", "", ""}, {}, SD_BUS_ERROR_UNKNOWN_METHOD, "Nothing"},
+        {{"Hold", "", "s"}, {}, SD_BUS_ERROR_UNKNOWN_INTERFACE, "com.example.Other", "com.example.Other"},
+        {{"Count", "", "u"}, {}, SD_BUS_ERROR_UNKNOWN_METHOD, "Count"}, // of another interface
+        {method("Take"),
+         {Dictionary{{"b", Bytes(std::string(1 << 20, 'x'))}}},
+         SD_BUS_ERROR_LIMITS_EXCEEDED,
+         "\"b\": the message"},
+        {method("Take"), {Dictionary{{"many", Value::Array(140000, true)}}}, SD_BUS_ERROR_LIMITS_EXCEEDED, "larger"},
+        {method("Take"), {deep}, SD_BUS_ERROR_INVALID_ARGS, "nested too deeply"},
+        {method("Fail"), {}, SD_BUS_ERROR_INVALID_ARGS, "scale: not a number \ufffd"},
+        {method("Misfit"), {}, SD_BUS_ERROR_FAILED, "not of type \"s\""},
+    };
+    for (const auto& bad : cases) {
+        auto got = call(*client, bad.member, {bad.args, {}}, bad.interface);
+        ASSERT_FALSE(got) << bad.text;
+        EXPECT_EQ(got.error().name, bad.name) << got.error().message;
+        EXPECT_THAT(got.error().message, HasSubstr(bad.text));
+    }
+    EXPECT_TRUE(call(*client, method("Take"), {{Dictionary()}, {}}));
+    EXPECT_EQ((*call(*client, method("Count"))).args[0], Value(7));
+}
+
+TEST(Ipc, VariantsThatNoValueHoldsAreRefusedByField)
+{
+    Service service;
+    sd_bus* bus = nullptr;
+    sd_bus_new(&bus);
+    sd_bus_set_address(bus, service.listener->endpoint().c_str());
+    sd_bus_negotiate_fds(bus, true);
+    ASSERT_GE(sd_bus_start(bus), 0);
+    const auto answer = [&](auto... contents) {
+        sd_bus_error error = SD_BUS_ERROR_NULL;
+        sd_bus_message* reply = nullptr;
+        const int result = sd_bus_call_method(bus, nullptr, kObjectPath, "com.example.Probe", "Take", &error, &reply,
+                                              "a{sv}", 1, "field", contents...);
+        std::string text = result < 0 ? error.message : sd_bus_message_get_signature(reply, true);
+        sd_bus_error_free(&error);
+        sd_bus_message_unref(reply);
+        return text;
+    };
+    EXPECT_THAT(answer("(ii)", 1, 2), HasSubstr("argument 1: \"field\": values of type 'r'"));
+    EXPECT_THAT(answer("a{us}", 1, 2, "x"), HasSubstr("\"field\": a dictionary's keys"));
+    EXPECT_THAT(answer("h", STDERR_FILENO), HasSubstr("\"field\": a variant can't hold a file handle"));
+    EXPECT_EQ(answer("a{ss}", 1, "k", "x"), "a{sv}"); // what other languages send
+    sd_bus_close_unref(bus);
+}
+
+TEST(Ipc, FloodWithoutReadingIsHeldBackAndThenAnswered)
+{
+    constexpr unsigned kCalls = 10'000;
+    Service service({.callsInFlight = 16, .queuedBytes = 1 << 20});
+    auto client = service.connect();
+    auto other = service.connect();
+    unsigned answered = 0;
+    for (unsigned i = 0; i < kCalls; ++i)
+        client->call(probe().name, method("Batch"), {},
+                     [&](const CallResult& result) { answered += result.has_value(); });
+    EXPECT_TRUE(call(*other, method("Count")));
+    EXPECT_TRUE(client->wait([&] { return answered == kCalls; }, kLong)) << answered;
+    EXPECT_EQ(service.mostHeld, 16u);
+}
+
+TEST(Ipc, DeafPeerIsDroppedAndOthersGoOn)
+{
+    Service service({.queuedBytes = 1 << 20});
+    auto deaf = service.connect();
+    auto other = service.connect();
+    service.await([&] { return service.connections.size() == 2; });
+    for (int i = 0; i < 3; ++i) service.connections[0]->push("Told", {{std::string(kBeyondSocketBuffers, 'x'), Dictionary()}, {}});
+    service.await([&] { return service.notes == std::vector<std::string>{"<invalidated>"}; });
+    EXPECT_TRUE(call(*other, method("Count")));
+    EXPECT_FALSE(deaf->wait([] { return false; }, kLong));
+    EXPECT_FALSE(deaf->connected());
+}
+
+TEST(Ipc, WhatAPeerSaidBeforeItVanishedStillArrivesAheadOfTheEnd)
+{
+    Service service({.callsInFlight = 2});
+    auto client = service.connect();
+    client->call(probe().name, method("Hold"), {}, [](const CallResult&) {});
+    client->call(probe().name, method("Hold"), {}, [](const CallResult&) {});
+    for (const char* text : {"a", "b", "c"}) client->call(probe().name, method("Note"), {{text}, {}}, {});
+    service.await([&] { return service.held.size() == 2; });
+    client.reset();
+    service.await([&] { return service.notes == std::vector<std::string>{"a", "b", "c", "<invalidated>"}; });
+    for (Responder& reply : std::exchange(service.held, {})) reply(Message{{"too late"}, {}});
+    EXPECT_TRUE(call(*service.connect(), method("Count")));
+}
+
+TEST(Ipc, InvalidationWritesTheLastAnswerAndDeliversNothingMore)
+{
+    Service service;
+    auto client = service.connect();
+    client->call(probe().name, method("Bye"), {{4 << 20}, {}}, [&](const CallResult& got) {
+        ASSERT_TRUE(got) << got.error().message;
+        EXPECT_EQ(got->args[0].asBytes()->size(), 4u << 20);
+    });
+    client->call(probe().name, method("Note"), {{"after"}, {}}, {});
+    EXPECT_FALSE(client->wait([] { return false; }, kLong));
+    EXPECT_FALSE(client->connected());
+    service.await([&] { return service.notes == std::vector<std::string>{"<invalidated>"}; });
+
+    // One that doesn't read is waited for, but not for ever.
+    auto deaf = service.connect();
+    service.await([&] { return service.connections.size() == 2; });
+    service.connections[1]->push("Told", {{std::string(kBeyondSocketBuffers, 'x'), Dictionary()}, {}});
+    service.connections[1]->invalidate();
+    service.settle();
+    EXPECT_EQ(service.clock.pendingTimers(), 1u);
+    service.clock.advance(31s, [&] { service.settle(); });
+    unsigned heard = 0;
+    deaf->onSignal([&](auto, auto, const Message&) { ++heard; });
+    EXPECT_FALSE(deaf->wait([] { return false; }, kLong));
+    EXPECT_EQ(heard, 0u);
+}
+
+TEST(Ipc, PeersThatDoNotSpeakTheProtocolAreDropped)
+{
+    Service service;
+    const FileHandle garbage = rawConnection(service);
+    ASSERT_GT(write(garbage.fd(), "GET / HTTP/1.1\r\n\r\n", 18), 0);
+    EXPECT_TRUE(readsUntilEnd(garbage.fd()));
+
+    const FileHandle silent = rawConnection(service);
+    service.await([&] { return service.connections.size() == 2; });
+    service.settle();
+    service.clock.advance(31s, [&] { service.settle(); });
+    EXPECT_TRUE(readsUntilEnd(silent.fd()));
+
+    EXPECT_TRUE(call(*service.connect(), method("Count")));
+    EXPECT_EQ(service.clock.pendingTimers(), 0u) << "an idle connection would wake the service";
+}
+
+TEST(Ipc, OtherUsersAreRefusedBeforeAnyoneIsAsked)
+{
+    EXPECT_FALSE(mayConnect(0, 1000));
+    EXPECT_TRUE(mayConnect(1000, 1000));
+    if (geteuid() != 0) GTEST_SKIP() << "only root can become somebody else";
+    Service service;
+    for (const std::string& path : {std::filesystem::path(service.directory()).parent_path().string(),
+                                    service.directory(), service.directory() + "/socket"})
+        chmod(path.c_str(), 0777);
+    std::thread([&] {
+        ASSERT_EQ(syscall(SYS_setresuid, 65534, 65534, -1), 0); // this thread's alone
+        EXPECT_TRUE(readsUntilEnd(rawConnection(service).fd()));
+    }).join();
+    service.settle();
+    EXPECT_TRUE(service.connections.empty());
+}
+
+TEST(Ipc, EndpointsAreApartFromEachOtherAndGoWithTheirListener)
+{
+    Service service;
+    auto endpoint = service.transport->anonymous(probe(), "com.example.endpoint");
+    auto second = service.transport->anonymous(probe(), "com.example.endpoint");
+    EXPECT_NE(endpoint->endpoint(), second->endpoint());
+    service.serve(*endpoint);
+    auto client = service.connect(*endpoint);
+    std::string told;
+    client->onSignal([&](auto interface, auto member, const Message& message) {
+        told = std::string(interface) + "." + std::string(member) + toJson(message.args);
+    });
+    EXPECT_EQ(service.connections.at(0)->queue()->label(), "com.example.endpoint");
+    EXPECT_EQ(service.connections.at(0)->peer().pid, getpid());
+    service.connections[0]->push("Told", {{"news", Dictionary{{"n", 1}}}, {}});
+    EXPECT_TRUE(client->wait([&] { return !told.empty(); }, kLong));
+    EXPECT_EQ(told, "com.example.Listener.Told[\"news\",{\"n\":1}]");
+
+    const std::string address = endpoint->endpoint();
+    endpoint.reset();
+    EXPECT_FALSE(Client::connect(address, kLong));
+    EXPECT_TRUE(call(*client, method("Count"))) << "a connection outlives its listener";
+}
+
+TEST(Ipc, ConnectionsBeyondWhatFitsWaitForTheirTurn)
+{
+    Service service({.connections = 1});
+    std::promise<void> starved;
+    int starvations = 0;
+    LogTap tap([&](const LogLine& line) {
+        if (line.text.find("can't accept") != std::string::npos && ++starvations == 1) starved.set_value();
+    });
+    auto first = service.connect();
+    const FileHandle second = rawConnection(service);
+    service.settle();
+    EXPECT_EQ(service.connections.size(), 1u);
+    first.reset();
+    service.await([&] { return service.connections.size() == 2; });
+
+    service.connections[1]->invalidate();
+    service.await([&] { return service.notes.size() == 2; });
+    rlimit before{};
+    getrlimit(RLIMIT_NOFILE, &before);
+    const rlimit none{1, before.rlim_max};
+    const FileHandle socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    sockaddr_un address{AF_UNIX, {}};
+    std::strcpy(address.sun_path, (service.directory() + "/socket").c_str());
+    setrlimit(RLIMIT_NOFILE, &none);
+    connect(socket.fd(), reinterpret_cast<sockaddr*>(&address), sizeof(address));
+    starved.get_future().wait();
+    service.settle();
+    setrlimit(RLIMIT_NOFILE, &before);
+    EXPECT_EQ(starvations, 1);
+    service.clock.advance(1s, [&] { service.settle(); });
+    service.await([&] { return service.connections.size() == 3; });
+}
+
+TEST(ListenSocket, TakesOverFromTheDeadOnly)
+{
+    TemporaryDirectory temporary;
+    const std::filesystem::path directory = temporary.path + "/a/b";
+    const auto path = directory / "socket";
+    const auto errorOf = [&] { return ListenSocket::bindExclusive(path).error().code; };
+    {
+        auto living = ListenSocket::bindExclusive(path);
+        ASSERT_TRUE(living) << living.error().description();
+        struct stat status{};
+        stat(directory.c_str(), &status);
+        EXPECT_EQ(status.st_mode & 07777, 0700u);
+        stat(path.c_str(), &status);
+        EXPECT_EQ(status.st_mode & 07777, 0600u);
+        EXPECT_EQ(errorOf(), EADDRINUSE);
+        std::filesystem::remove(directory / "socket.lock"); // as with a socket of the service manager
+        EXPECT_EQ(errorOf(), EADDRINUSE);
+        std::filesystem::create_hard_link(path, directory / "endpoint-dead");
+    }
+    EXPECT_FALSE(std::filesystem::exists(path));
+    std::filesystem::create_hard_link(directory / "endpoint-dead", path);
+    {
+        auto living = ListenSocket::bindUnguessable(directory, "endpoint-");
+        sweepDeadSockets(directory, "endpoint-");
+        EXPECT_TRUE(living && std::filesystem::exists(living->path()));
+        EXPECT_FALSE(std::filesystem::exists(directory / "endpoint-dead"));
+        EXPECT_TRUE(ListenSocket::bindExclusive(path)) << "replaces a dead one";
+    }
+    std::fclose(std::fopen(path.c_str(), "w"));
+    EXPECT_EQ(errorOf(), EEXIST);
+    std::filesystem::create_directory_symlink(directory, temporary.path + "/link");
+    EXPECT_FALSE(preparePrivateDirectory(temporary.path + "/link"));
+    EXPECT_EQ(busAddress("/run/a b%"), "unix:path=/run/a%20b%25");
+}
+
+TEST(ListenSocket, ComesFromTheServiceManagerWhereThereIsOne)
+{
+    testing::FLAGS_gtest_death_test_style = "threadsafe";
+    const auto activated = [] {
+        TemporaryDirectory temporary;
+        auto passed = std::move(*ListenSocket::bindExclusive(temporary.path + "/managed"));
+        dup2(passed.fd(), 3);
+        setenv("LISTEN_PID", std::to_string(getpid()).c_str(), 1);
+        setenv("LISTEN_FDS", "1", 1);
+        auto taken = ListenSocket::fromServiceManager();
+        const bool right = taken && taken->fd() == 3 && taken->path() == passed.path();
+        taken.reset();
+        std::exit(right && std::filesystem::exists(passed.path()) ? 0 : 1);
+    };
+    EXPECT_EXIT(activated(), testing::ExitedWithCode(0), "");
+}
+
+TEST(Ipc, ToolsOfOthersCanCallAndIntrospect)
+{
+    Service service;
+    const std::string address = "--address=" + service.listener->endpoint();
+    const std::string object = kObjectPath;
+    const struct {
+        std::string program, arguments, expected;
+    } cases[] = {
+        {"busctl", address + " call com.example.x " + object + " com.example.Probe Take a{sv} 1 k s v", "a{sv} 1 \"k\" s \"v\""},
+        {"busctl", address + " call com.example.x " + object + " com.example.Probe Note s hello", ""},
+        {"busctl", address + " call com.example.x " + object + " com.example.Probe Take s v", "takes \"a{sv}\", not \"s\""},
+        {"busctl", address + " introspect com.example.x " + object, ".Hold"},
+        {"busctl", address + " tree com.example.x", object},
+        {"busctl", address + " call com.example.x " + object + " org.freedesktop.DBus.Peer Ping", ""},
+        {"gdbus", "call --dest com.example.x " + address + " --object-path " + object + " --method com.example.Extra.Count", "(uint32 7,)"},
+        {"gdbus", "introspect --recurse --dest com.example.x " + address + " --object-path /", "Hold();"},
+    };
+    for (const auto& tool : cases) {
+        if (std::system(("command -v " + tool.program + " >/dev/null").c_str()) != 0)
+            GTEST_SKIP() << "no " << tool.program;
+        const std::string output = commandOutput(tool.program + " " + tool.arguments);
+        EXPECT_TRUE(tool.expected.empty() ? output.empty() : output.contains(tool.expected)) << tool.arguments << "\n" << output;
+    }
+    service.await([&] { return std::ranges::count(service.notes, "hello") == 1; });
+}
+
+} // namespace
+} // namespace platform::ipc
