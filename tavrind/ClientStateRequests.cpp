@@ -115,7 +115,9 @@ void ClientState::_withBag(ExchangePtr exchange, std::move_only_function<void()>
         std::tie(exchange->bag, exchange->userAgent) =
             self->_queue->sync([&] { return std::pair(self->_bag, self->_userAgent); });
         if (!ensured || !exchange->bag) {
-            exchange->log().error("Bag fetch failed, can't complete non-cached {}.", exchange->what);
+            if (exchange->isSearch)
+                exchange->log().error("Bag fetch failed, can't complete non-cached query {}.", exchange->request->queryString);
+            else exchange->log().error("Bag fetch failed, can't complete non-cached {}.", exchange->what);
             exchange->answer(nullptr, makeTAVError(TAVErrorTimeout, "timeout"));
             return self->_skipSearch(*exchange, kBagFetchFailed);
         }
