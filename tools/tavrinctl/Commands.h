@@ -1,0 +1,27 @@
+#pragma once
+
+#include <functional>
+#include <string>
+#include <vector>
+
+#include "tools/tavrinctl/Tool.h"
+
+namespace CLI {
+class App;
+}
+
+/// The commands: each adds itself to the command line, and sets `chosen` when it is the one that was given.
+namespace tavrin::ctl {
+
+/// What the command does, once the command line has been read.
+using Command = std::function<void(const Options&)>;
+
+void addSearchCommand(CLI::App& app, Command& chosen);
+/// zkw, more, card, lookup and flight.
+void addOtherRequestCommands(CLI::App& app, Command& chosen);
+/// bag, sessions, status and stats.
+void addInspectCommands(CLI::App& app, Command& chosen);
+/// defaults read, write, delete and list.
+void addDefaultsCommands(CLI::App& app, Command& chosen);
+
+} // namespace tavrin::ctl

@@ -1,0 +1,152 @@
+// tavrinctl zkw, more, card, lookup, flight.
+
+#include <CLI/CLI.hpp>
+#include <fmt/format.h>
+
+#include "CoreTavrin/TAVRequest.h"
+#include "tools/tavrinctl/Commands.h"
+#include "tools/tavrinctl/RequestRunner.h"
+
+namespace tavrin::ctl {
+
+using platform::Url;
+using platform::Value;
+
+namespace {
+
+struct RequestOptions {
+    std::string what;
+    bool endpoint = false;
+    bool verbose = false;
+    bool searchFlights = false;
+    std::vector<std::string> items;
+    std::string context, clientContext, domain;
+    std::int64_t selection = 0;
+};
+
+Exchange run(const Options& options, const RequestOptions& requestOptions, TAVRequest& request)
+{
+    request.verboseReply = requestOptions.verbose;
+    request.queryItems = queryItems(requestOptions.items);
+    RequestRunner runner(options);
+    return requestOptions.endpoint ? runner.runThroughEndpoint(request, requestOptions.what)
+                                   : runner.run(request, requestOptions.what);
+}
+
+/// The first URL under `key` in the answer to a search for `query`: in a result set, or in its sections or results.
+Url urlFromSearch(const Options& options, const std::string& query, const char* key)
+{
+    RequestRunner runner(options);
+    const Exchange exchange =
+        runner.run(*TAVSearchRequest::searchRequestWithString(query, StartSearchTrigger::NewCharacter), query);
+    if (exchange.outcome() != Outcome::Answered) throw Failure("the search before it: " + summary(exchange));
+    const Value sets = rawResponse(exchange);
+    std::vector<Value> places;
+    for (std::size_t i = 0; i < sets.count(); ++i) {
+        places.push_back(sets[i]);
+        for (const char* list : {"sections", "results"})
+            if (const Value::Array* parts = sets[i][list].asArray())
+                places.insert(places.end(), parts->begin(), parts->end());
+    }
+    for (const Value& place : places) {
+        const std::string* text = place[key].asString();
+        if (auto url = text ? Url::parse(*text) : std::nullopt) return *url;
+    }
+    throw Failure(
+        fmt::format("the answer to \"{}\" has no \"{}\": try another query, or give the URL itself", query, key));
+}
+
+Url urlFor(const Options& options, const std::string& what, const char* key)
+{
+    const bool isUrl = what.starts_with("https://") || what.starts_with("http://");
+    if (!isUrl) return urlFromSearch(options, what, key);
+    if (auto url = Url::parse(what)) return *url;
+    throw Failure(fmt::format("\"{}\" is no valid URL", what), 2);
+}
+
+std::optional<std::string> given(const std::string& text)
+{
+    return text.empty() ? std::nullopt : std::optional(text);
+}
+
+/// A command with the options that all of these share.
+CLI::App* add(CLI::App& app, const char* name, const char* description, const std::shared_ptr<RequestOptions>& options)
+{
+    CLI::App* command = app.add_subcommand(name, description);
+    command->add_flag("-v,--verbose", options->verbose, "Show the HTTP request and response");
+    command->add_option("--item", options->items, "NAME=VALUE to add to the request's query; may be repeated");
+    return command;
+}
+
+} // namespace
+
+void addOtherRequestCommands(CLI::App& app, Command& chosen)
+{
+    const auto onChosen = [&chosen](CLI::App* command, auto action) {
+        command->callback(
+            [&chosen, action] { chosen = [action](const Options& common) { finish(common, action(common)); }; });
+    };
+
+    auto zkw = std::make_shared<RequestOptions>();
+    onChosen(add(app, "zkw", "Suggestions before anything is typed", zkw), [zkw](const Options& common) {
+        TAVZeroKeywordRequest request;
+        return run(common, *zkw, request);
+    });
+
+    auto more = std::make_shared<RequestOptions>();
+    CLI::App* moreCommand = add(app, "more", "More results of a section", more);
+    moreCommand->add_option("what", more->what, "The URL in an earlier answer, or a query to search for first")
+        ->required();
+    moreCommand->add_flag("--endpoint", more->endpoint, "Ask over the endpoint, not the connection");
+    onChosen(moreCommand, [more](const Options& common) {
+        TAVMoreResultsRequest request;
+        request.moreResultsURL = urlFor(common, more->what, "more_results_url");
+        return run(common, *more, request);
+    });
+
+    auto card = std::make_shared<RequestOptions>();
+    CLI::App* cardCommand = add(app, "card", "A result's card", card);
+    cardCommand->add_option("what", card->what, "The URL in a result, or a query to search for first")->required();
+    cardCommand->add_flag("--endpoint", card->endpoint, "Ask over the endpoint, not the connection");
+    onChosen(cardCommand, [card](const Options& common) {
+        TAVCardRequest request;
+        request.cardURL = urlFor(common, card->what, "card_url");
+        return run(common, *card, request);
+    });
+
+    auto lookup = std::make_shared<RequestOptions>();
+    CLI::App* lookupCommand = add(app, "lookup", "Look words of a text up", lookup);
+    lookupCommand->add_option("words", lookup->what, "The words")->required();
+    lookupCommand->add_option("--context", lookup->context, "The text around them");
+    lookupCommand->add_option("--client-context", lookup->clientContext, "Where the text stands: mail, article, …");
+    lookupCommand->add_option("--domain", lookup->domain, "Domain of the hint that was tapped");
+    lookupCommand
+        ->add_option("--selection", lookup->selection, "How they were chosen: 0 default, 1 explicit, 2 by a hint")
+        ->check(CLI::Range(0, 2));
+    onChosen(lookupCommand, [lookup](const Options& common) {
+        TAVLookupRequest request;
+        request.queryString = lookup->what;
+        request.triggerEvent = StartSearchTrigger::Lookup;
+        request.queryContext = given(lookup->context);
+        request.clientContext = given(lookup->clientContext);
+        request.hintDomain = given(lookup->domain);
+        request.selectionType = static_cast<LookupSelectionType>(lookup->selection);
+        return run(common, *lookup, request);
+    });
+
+    auto flight = std::make_shared<RequestOptions>();
+    CLI::App* flightCommand = add(app, "flight", "A flight by its number, or flights that match", flight);
+    flightCommand->add_option("flight", flight->what, "Its number, or what to search for")->required();
+    flightCommand->add_flag("--search", flight->searchFlights, "Search for flights that match");
+    onChosen(flightCommand, [flight](const Options& common) {
+        std::unique_ptr<TAVRequest> request;
+        if (flight->searchFlights)
+            request = std::make_unique<TAVFlightSearchRequest>();
+        else
+            request = std::make_unique<TAVFlightLookupRequest>();
+        request->queryString = flight->what;
+        return run(common, *flight, *request);
+    });
+}
+
+} // namespace tavrin::ctl

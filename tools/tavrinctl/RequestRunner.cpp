@@ -1,0 +1,111 @@
+#include "tools/tavrinctl/RequestRunner.h"
+
+#include <fmt/format.h>
+
+#include "CoreTavrin/TAVBag.h"
+#include "CoreTavrin/TAVRequest.h"
+
+namespace tavrin::ctl {
+
+namespace {
+
+using Clock = std::chrono::steady_clock;
+
+double millisecondsSince(Clock::time_point begin)
+{
+    return std::chrono::duration<double, std::milli>(Clock::now() - begin).count();
+}
+
+} // namespace
+
+RequestRunner::RequestRunner(const Options& options) : _options(options), _session(openSession(options))
+{
+    _bag = valueOf(_session.client->bag());
+}
+
+std::shared_ptr<Exchange> RequestRunner::send(TAVRequest& request, std::string query, Shown answered)
+{
+    for (const auto& earlier : _outstanding) earlier->overtaken = true;
+    auto exchange = std::make_shared<Exchange>();
+    exchange->query = std::move(query);
+    exchange->queryId = request.queryId = ++_lastQueryId;
+    if (dynamic_cast<const TAVSearchRequest*>(&request)) exchange->skipReason = skipReason(_bag, exchange->query);
+    _outstanding.push_back(exchange);
+
+    _session.client->send(request,
+                          [this, exchange, begin = Clock::now(), answered](platform::Result<TAVAnswer> answer) {
+                              exchange->latency = millisecondsSince(begin);
+                              if (answer)
+                                  exchange->answer = std::move(*answer);
+                              else
+                                  exchange->problem = answer.error().reason();
+                              std::erase(_outstanding, exchange);
+                              if (answered) answered(*exchange);
+                          });
+    return exchange;
+}
+
+void RequestRunner::pause(std::chrono::duration<double, std::milli> duration)
+{
+    _session.client->wait([] { return false; }, std::chrono::duration_cast<platform::Duration>(duration));
+}
+
+void RequestRunner::waitForAll()
+{
+    if (_session.client->wait([this] { return _outstanding.empty(); }, platform::durationFromSeconds(_options.timeout)))
+        return;
+    const std::string problem = _session.client->connected() ? fmt::format("no answer within {:g} s", _options.timeout)
+                                                             : "the daemon closed the connection";
+    for (const auto& exchange : _outstanding) exchange->problem = problem;
+    _outstanding.clear();
+}
+
+Exchange RequestRunner::run(TAVRequest& request, std::string query)
+{
+    const auto exchange = send(request, std::move(query));
+    waitForAll();
+    return *exchange;
+}
+
+Exchange RequestRunner::runThroughEndpoint(TAVRequest& request, std::string query)
+{
+    const auto endpoint = valueOf(TAVEndpointClient::connect(_session.endpoint));
+    endpoint->setTimeout(platform::durationFromSeconds(_options.timeout));
+    Exchange exchange;
+    exchange.query = std::move(query);
+    exchange.queryId = request.queryId = ++_lastQueryId;
+    const auto begin = Clock::now();
+    auto answer = endpoint->request(request, _session.configuration);
+    exchange.latency = millisecondsSince(begin);
+    if (answer)
+        exchange.answer = std::move(*answer);
+    else
+        exchange.problem = answer.error().reason();
+    return exchange;
+}
+
+std::vector<std::shared_ptr<TAVQueryItem>> queryItems(const std::vector<std::string>& texts)
+{
+    std::vector<std::shared_ptr<TAVQueryItem>> items;
+    for (const std::string& text : texts) {
+        const auto equals = text.find('=');
+        if (equals == 0 || text.empty()) throw Failure(fmt::format("--item \"{}\": give it as NAME=VALUE", text), 2);
+        std::optional<std::string> value;
+        if (equals != std::string::npos) value = text.substr(equals + 1);
+        items.push_back(std::make_shared<TAVQueryItem>(text.substr(0, equals), std::move(value)));
+    }
+    return items;
+}
+
+void finish(const Options& options, const Exchange& exchange)
+{
+    if (options.json) {
+        printJson(describe(exchange));
+    } else {
+        printLine(summary(exchange));
+        printAnswer(exchange);
+    }
+    if (exchange.outcome() == Outcome::Failed) throw Failure("", 1); // said already
+}
+
+} // namespace tavrin::ctl

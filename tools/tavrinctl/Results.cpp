@@ -1,0 +1,198 @@
+#include "tools/tavrinctl/Results.h"
+
+#include <cmath>
+
+#include <fmt/format.h>
+
+#include "CoreTavrin/TAVBag.h"
+#include "CoreTavrin/TAVError.h"
+#include "CoreTavrin/TAVReply.h"
+#include "platform/Text.h"
+#include "tools/tavrinctl/Tool.h"
+
+namespace tavrin::ctl {
+
+using platform::Dictionary;
+using platform::Value;
+
+namespace {
+
+std::string textIn(const Value& value)
+{
+    const std::string* text = value.asString();
+    return text ? *text : std::string();
+}
+
+const Value::Array& arrayOf(const Value& value)
+{
+    static const Value::Array none;
+    const Value::Array* array = value.asArray();
+    return array ? *array : none;
+}
+
+std::string counted(std::size_t count, std::string_view noun)
+{
+    return fmt::format("{} {}{}", count, noun, count == 1 ? "" : "s");
+}
+
+Value valueOfError(const platform::Error& error)
+{
+    return Value::dictionaryOf({{"domain", error.domain}, {"code", error.code}, {"reason", error.reason()}});
+}
+
+/// An error's reason, and what to look at where that helps.
+std::string explain(const platform::Error& error)
+{
+    const std::string reason = printable(error.reason().empty() ? error.description() : error.reason());
+    if (error.domain == TAVErrorDomain && error.code == TAVErrorTimeout)
+        return reason + " (no bag yet: \"tavrinctl defaults read TAVBagURL\" tells where it is fetched from)";
+    return reason;
+}
+
+void printHeaders(const Value& headers)
+{
+    if (const Dictionary* dictionary = headers.asDictionary())
+        for (const auto& [name, value] : *dictionary) {
+            const std::string* text = value.asString();
+            printLine(
+                dim(fmt::format("    {}: {}", printable(name), text ? printable(*text) : platform::toJson(value))));
+        }
+}
+
+void printHttp(const TAVReply& reply)
+{
+    if (reply.httpRequest) {
+        printLine(dim(fmt::format("  {} {}", reply.httpRequest->method, printable(reply.httpRequest->url))));
+        printHeaders(reply.httpRequest->headers);
+    }
+    if (reply.httpResponse) {
+        printLine(dim(fmt::format("  → {}", reply.httpResponse->statusCode)));
+        printHeaders(reply.httpResponse->headers);
+    }
+}
+
+} // namespace
+
+std::string_view outcomeName(Outcome outcome)
+{
+    switch (outcome) {
+    case Outcome::Answered: return "answered";
+    case Outcome::Skipped: return "skipped";
+    case Outcome::Overtaken: return "overtaken";
+    case Outcome::Failed: break;
+    }
+    return "failed";
+}
+
+Outcome Exchange::outcome() const
+{
+    if (!answer || answer->error) return Outcome::Failed;
+    if (answer->reply) return Outcome::Answered;
+    return overtaken && skipReason.empty() ? Outcome::Overtaken : Outcome::Skipped;
+}
+
+std::string skipReason(const TAVBagAnswer& answer, std::string_view query)
+{
+    if (!answer.bag) return {};
+    if (!answer.bag->isEnabled()) return "the bag has search switched off";
+    if (platform::utf16Length(query) < answer.bag->minimumQueryLength())
+        return fmt::format("shorter than the bag's minimum of {}", answer.bag->minimumQueryLength());
+    return {};
+}
+
+std::vector<ListedResult> resultsIn(const Value& rawResponse)
+{
+    std::vector<ListedResult> results;
+    for (const Value& set : arrayOf(rawResponse)) {
+        for (const Value& result : arrayOf(set["results"])) {
+            ListedResult listed{textIn(result["section_name"]), textIn(result["title"]), textIn(result["url"]),
+                                textIn(result["description"])};
+            if (!listed.title.empty()) results.push_back(std::move(listed));
+        }
+    }
+    return results;
+}
+
+std::vector<std::string> suggestionsIn(const Value& rawResponse)
+{
+    std::vector<std::string> suggestions;
+    for (const Value& set : arrayOf(rawResponse)) {
+        for (const Value& suggestion : arrayOf(set["suggestions"])) {
+            if (std::string text = textIn(suggestion["suggestion"]); !text.empty())
+                suggestions.push_back(std::move(text));
+        }
+    }
+    return suggestions;
+}
+
+Value rawResponse(const Exchange& exchange)
+{
+    if (!exchange.answer || !exchange.answer->reply || !exchange.answer->reply->rawResponse) return {};
+    return platform::parseJson(exchange.answer->reply->rawResponse->view()).value_or(Value());
+}
+
+Value describe(const Exchange& exchange)
+{
+    Dictionary description{{"query", exchange.query},
+                           {"query_id", exchange.queryId},
+                           {"outcome", outcomeName(exchange.outcome())},
+                           {"latency_ms", std::round(exchange.latency * 100) / 100}};
+    if (exchange.outcome() == Outcome::Skipped && !exchange.skipReason.empty())
+        description.set("reason", exchange.skipReason);
+    if (!exchange.answer) description.set("reason", exchange.problem);
+    if (exchange.answer && exchange.answer->error) description.set("error", valueOfError(*exchange.answer->error));
+    if (exchange.outcome() != Outcome::Answered) return description;
+
+    const Value raw = rawResponse(exchange);
+    Value::Array results, suggestions;
+    for (const ListedResult& result : resultsIn(raw))
+        results.push_back(Value::dictionaryOf({{"section", result.section},
+                                               {"title", result.title},
+                                               {"url", result.url},
+                                               {"description", result.description}}));
+    for (std::string& suggestion : suggestionsIn(raw)) suggestions.emplace_back(std::move(suggestion));
+    description.set("results", std::move(results));
+    description.set("suggestions", std::move(suggestions));
+    description.set("response", raw);
+    const TAVReply& reply = *exchange.answer->reply;
+    if (reply.httpRequest) description.set("http_request", platform::toValue(*reply.httpRequest));
+    if (reply.httpResponse) description.set("http_response", platform::toValue(*reply.httpResponse));
+    return description;
+}
+
+std::string summary(const Exchange& exchange)
+{
+    std::string what = std::string(outcomeName(exchange.outcome()));
+    switch (exchange.outcome()) {
+    case Outcome::Answered: {
+        const Value raw = rawResponse(exchange);
+        what = fmt::format("{}, {}", counted(resultsIn(raw).size(), "result"), counted(raw.count(), "set"));
+        break;
+    }
+    case Outcome::Skipped:
+        if (!exchange.skipReason.empty()) what += ": " + exchange.skipReason;
+        break;
+    case Outcome::Overtaken: what += ": came after a later key, delivered empty"; break;
+    case Outcome::Failed: what += ": " + (exchange.answer ? explain(*exchange.answer->error) : exchange.problem); break;
+    }
+    return fmt::format("{:<16} {:>7.1f} ms  {}", "\"" + printable(exchange.query) + "\"", exchange.latency, what);
+}
+
+void printAnswer(const Exchange& exchange)
+{
+    if (exchange.outcome() != Outcome::Answered) return;
+    printHttp(*exchange.answer->reply);
+    const Value raw = rawResponse(exchange);
+    std::string section;
+    for (const ListedResult& result : resultsIn(raw)) {
+        if (result.section != section) printLine(bold("  " + printable(section = result.section)));
+        printLine(fmt::format("    {}", printable(result.title)));
+        if (!result.url.empty()) printLine(dim("      " + printable(result.url)));
+    }
+    std::string suggestions;
+    for (const std::string& suggestion : suggestionsIn(raw))
+        suggestions += (suggestions.empty() ? "" : " · ") + printable(suggestion);
+    if (!suggestions.empty()) printLine(bold("  Suggestions") + "\n    " + suggestions);
+}
+
+} // namespace tavrin::ctl

@@ -1,0 +1,57 @@
+#pragma once
+
+#include <string>
+#include <vector>
+
+#include "CoreTavrin/TAVClient.h"
+#include "platform/Value.h"
+
+namespace tavrin::ctl {
+
+/// What became of a request, as a user would say it.
+enum class Outcome {
+    Answered,
+    Skipped,   ///< the daemon had a reason not to ask the service
+    Overtaken, ///< a later request was accepted before the answer came, which was then delivered empty
+    Failed,
+};
+[[nodiscard]] std::string_view outcomeName(Outcome outcome);
+
+/// One request and its answer.
+struct Exchange {
+    std::string query;
+    std::int64_t queryId = 0;
+    double latency = 0;              ///< milliseconds from the call to its answer
+    bool overtaken = false;          ///< a later request was sent before the answer came
+    std::string skipReason;          ///< why the daemon would skip this query, by its bag; empty if it wouldn't
+    std::optional<TAVAnswer> answer; ///< none: no answer in time, or the connection ended
+    std::string problem;             ///< what happened instead of an answer
+
+    [[nodiscard]] Outcome outcome() const;
+};
+
+/// Why the daemon doesn't ask the service for `query` under this bag; empty if it does.
+[[nodiscard]] std::string skipReason(const TAVBagAnswer& bag, std::string_view query);
+
+/// A result as it is listed.
+struct ListedResult {
+    std::string section;
+    std::string title;
+    std::string url;
+    std::string description;
+};
+/// The results of an answer, in order: what has a "title" in the "results" of a result set.
+[[nodiscard]] std::vector<ListedResult> resultsIn(const platform::Value& rawResponse);
+/// The texts of its suggestions.
+[[nodiscard]] std::vector<std::string> suggestionsIn(const platform::Value& rawResponse);
+/// The service's answer as a value; null where there is none.
+[[nodiscard]] platform::Value rawResponse(const Exchange& exchange);
+
+/// {"query", "outcome", "latency_ms", "results", …} for scripts.
+[[nodiscard]] platform::Value describe(const Exchange& exchange);
+/// One line: what was asked, what became of it, how long it took.
+[[nodiscard]] std::string summary(const Exchange& exchange);
+/// Results by section, suggestions, and the HTTP request and response of a verbose reply.
+void printAnswer(const Exchange& exchange);
+
+} // namespace tavrin::ctl

@@ -1,0 +1,80 @@
+#include "tools/tavrinctl/Tool.h"
+
+#include <cstdio>
+#include <cstdlib>
+#include <unistd.h>
+
+#include <fmt/format.h>
+
+namespace tavrin::ctl {
+
+std::unique_ptr<TAVClient> connect(const Options& options)
+{
+    auto client = TAVClient::connect(options.address);
+    if (!client)
+        throw Failure(
+            fmt::format("no daemon answers at {} ({}).\nStart it with \"systemctl --user start tavrind.socket\", or "
+                        "run tavrind; --address names another place.",
+                        options.address, client.error().reason()));
+    (*client)->setTimeout(platform::durationFromSeconds(options.timeout));
+    return std::move(*client);
+}
+
+Session openSession(const Options& options)
+{
+    Session session{connect(options), {options.identifier, options.agent}, {}};
+    auto endpoint = session.client->configure(session.configuration);
+    if (!endpoint && !session.client->connected())
+        throw Failure("the daemon refused this client: --identifier and --agent must not be empty");
+    session.endpoint = valueOf(std::move(endpoint));
+    return session;
+}
+
+void printJson(const platform::Value& value)
+{
+    printLine(platform::toJson(value, platform::JsonStyle::Pretty));
+}
+
+void printLine(const std::string& text)
+{
+    std::fwrite(text.data(), 1, text.size(), stdout);
+    std::fputc('\n', stdout);
+    std::fflush(stdout); // answers are read as they come, also through a pipe
+}
+
+bool colours()
+{
+    static const bool wanted = isatty(STDOUT_FILENO) == 1 && !std::getenv("NO_COLOR");
+    return wanted;
+}
+
+std::string bold(const std::string& text)
+{
+    return colours() ? "\033[1m" + text + "\033[0m" : text;
+}
+
+std::string dim(const std::string& text)
+{
+    return colours() ? "\033[2m" + text + "\033[0m" : text;
+}
+
+std::string printable(std::string_view text)
+{
+    std::string clean;
+    clean.reserve(text.size());
+    for (std::size_t i = 0; i < text.size(); ++i) {
+        const auto byte = static_cast<unsigned char>(text[i]);
+        const auto next = i + 1 < text.size() ? static_cast<unsigned char>(text[i + 1]) : 0;
+        if (byte < 0x20 || byte == 0x7f) {
+            clean += ' ';
+        } else if (byte == 0xc2 && next >= 0x80 && next < 0xa0) { // the control characters beyond ASCII
+            clean += ' ';
+            ++i;
+        } else {
+            clean += text[i];
+        }
+    }
+    return clean;
+}
+
+} // namespace tavrin::ctl
