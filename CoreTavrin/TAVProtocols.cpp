@@ -69,6 +69,14 @@ RequestReply requestReply(ipc::Responder responder)
         });
 }
 
+/// A caller that can make one call only, such as busctl, sends its configuration inside its request.
+void introduceAlong(TAVDaemonXPC& daemon, const Value& value)
+{
+    if (!value.asDictionary()) return;
+    auto configuration = platform::castRecord<TAVSessionConfiguration>(platform::recordFromValue(value, coreRecordClasses()));
+    daemon.configure(configuration.value_or(nullptr), Reply<std::string>([](const std::string&) {}));
+}
+
 class ClientProxy final : public TAVClientXPC {
 public:
     explicit ClientProxy(std::weak_ptr<ipc::Connection> connection) : _connection(std::move(connection)) {}
@@ -188,7 +196,10 @@ ipc::Handler daemonHandler(std::weak_ptr<TAVDaemonXPC> object, std::weak_ptr<TAV
                 }));
         } else if (member == "Request") {
             auto request = record<TAVRequest>(arguments, 0, "request", reply);
-            if (request) return daemon->request(std::move(*request), requestReply(std::move(reply)));
+            if (request) {
+                introduceAlong(*daemon, arguments.args[0]["configuration"]);
+                return daemon->request(std::move(*request), requestReply(std::move(reply)));
+            }
             if (request.error() == Refusal::UnknownClass) reply.abandon();
         } else if (member == "ReportEvent") {
             auto feedback = record<ZRFeedback>(arguments, 2, "feedback", reply);
