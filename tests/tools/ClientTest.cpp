@@ -1,0 +1,236 @@
+#include "CoreTavrin/TAVClient.h"
+
+#include <filesystem>
+#include <thread>
+
+#include <gmock/gmock.h>
+#include <sys/mman.h>
+#include <unistd.h>
+
+#include "CoreTavrin/TAVBag.h"
+#include "CoreTavrin/TAVError.h"
+#include "CoreTavrin/TAVProtocols.h"
+#include "CoreTavrin/TAVReply.h"
+#include "CoreTavrin/TAVRequest.h"
+#include "CoreTavrin/TAVSessionConfiguration.h"
+#include "platform/RunLoop.h"
+#include "searchrecords/ZRRecords.h"
+#include "searchrecords/ZRViewFeedback.h"
+#include "tests/support/ManualClock.h"
+
+namespace tavrin::test {
+namespace {
+
+using namespace std::chrono_literals;
+using platform::Dictionary;
+using platform::Value;
+
+std::shared_ptr<const TAVBag> someBag()
+{
+    return std::make_shared<const TAVBag>(Value::dictionaryOf({{"version", "7"}}), "Example/1");
+}
+
+/// Answers every operation of the daemon with what it was asked, so that both directions are seen. On the connection's
+/// queue; `closing` says what an invalid configuration does.
+struct EchoDaemon final : TAVDaemonXPC, TAVDiagnosticsXPC, TAVEndpointXPC {
+    std::shared_ptr<TAVClientXPC> client;
+    std::weak_ptr<platform::ipc::Connection> connection;
+    std::string endpoint;
+    std::vector<RequestReply> held;
+    std::mutex mutex;
+    std::vector<std::string> events;
+
+    void configure(std::shared_ptr<TAVSessionConfiguration> configuration, platform::Reply<std::string> reply) override
+    {
+        if (!configuration->identifier) {
+            reply.abandon();
+            return connection.lock()->invalidate();
+        }
+        reply(endpoint);
+        client->bagDidLoad(someBag(), makeTAVError(TAVErrorBagFetch, *configuration->userAgent));
+    }
+    void bag(BagReply reply) override { reply(someBag(), std::nullopt); }
+    void request(std::shared_ptr<TAVRequest> request, RequestReply reply) override
+    {
+        if (request->queryString == "hold") return held.push_back(std::move(reply));
+        if (request->queryString == "fail") return reply(request->queryId, nullptr, makeTAVError(500, "no URL"));
+        if (request->queryString == "silence") return reply.abandon();
+        for (RequestReply& earlier : std::exchange(held, {})) earlier(-1, nullptr, std::nullopt);
+        auto echoed = std::make_shared<TAVReply>();
+        echoed->rawResponse = platform::Bytes(std::string(request->className()) + ":" + request->queryString);
+        reply(request->queryId, std::move(echoed), std::nullopt);
+    }
+    void reportEvent(const std::string& event, std::int64_t queryId, std::shared_ptr<ZRFeedback> feedback) override
+    {
+        std::lock_guard lock(mutex);
+        events.push_back(event + " " + std::to_string(queryId) + " " + std::string(feedback->className()));
+    }
+    void feedback(const std::string&, platform::Reply<Value::Array, OptionalError> reply) override
+    {
+        std::lock_guard lock(mutex);
+        Value::Array all;
+        for (const std::string& event : events) all.push_back(Value::dictionaryOf({{"event", event}}));
+        reply(std::move(all), std::nullopt);
+    }
+    void listenToFlusher(platform::Reply<std::string> reply) override { reply("unix:path=/flusher"); }
+    void listSessions(platform::Reply<Value::Array> reply) override
+    {
+        reply({Value::dictionaryOf({{"identifier", "com.example"}, {"agent", "Example/1"}})});
+    }
+    void fileHandleAndAttributesForResource(const std::string& resource, ResourceReply reply) override
+    {
+        if (resource.empty()) return reply({}, {}, makeTAVError(TAVErrorNotFound, "no such resource"));
+        platform::FileHandle file(memfd_create("resource", MFD_CLOEXEC));
+        EXPECT_EQ(write(file.fd(), resource.data(), resource.size()), static_cast<ssize_t>(resource.size()));
+        reply(std::move(file), Value::dictionaryOf({{"version", 3}}), std::nullopt);
+    }
+    void request(std::shared_ptr<TAVRequest> request, std::shared_ptr<TAVSessionConfiguration> configuration,
+                 RequestReply reply) override
+    {
+        auto echoed = std::make_shared<TAVReply>();
+        echoed->geoSessionEntityString = *configuration->identifier;
+        reply(request->queryId, std::move(echoed), std::nullopt);
+    }
+    void loadImages(Value::Array, std::uint64_t, platform::Reply<Value> reply) override { reply(Dictionary()); }
+    Value status() override { return Value::dictionaryOf({{"pid", 1}}); }
+    std::string statistics() override { return "# EOF\n"; }
+};
+
+/// The daemon's listeners on real sockets, with an `EchoDaemon` behind them.
+struct ClientTest : testing::Test {
+    ClientTest()
+    {
+        platform::failOnReplyMisuse();
+        transport = platform::ipc::makeBusTransport(loop, pool, clock, directory);
+        endpoint = transport->anonymous(endpointInterface(), "test.endpoint");
+        daemon->endpoint = endpoint->endpoint();
+        endpoint->setAcceptor([this](auto connection) {
+            connection->exportObject(endpointHandler(daemon));
+            connection->resume();
+            connections.push_back(std::move(connection));
+        });
+        endpoint->resume();
+        listener = std::move(*transport->listen(daemonInterface(), "test.connection"));
+        listener->setAcceptor([this](auto connection) {
+            daemon->client = makeClientProxy(connection);
+            daemon->connection = connection;
+            connection->exportObject(daemonHandler(daemon, daemon));
+            connection->resume();
+            connections.push_back(std::move(connection));
+        });
+        listener->resume();
+        thread = std::thread([this] { loop.run(); });
+        client = TAVClient::connect(listener->endpoint()).value();
+    }
+    ~ClientTest() override
+    {
+        client.reset();
+        loop.stop();
+        thread.join();
+        for (RequestReply& reply : daemon->held) reply.abandon();
+        connections.clear();
+        listener.reset();
+        endpoint.reset();
+        transport.reset();
+        std::filesystem::remove_all(directory);
+    }
+
+    static std::string temporaryDirectory()
+    {
+        std::string path = "/tmp/client-test-XXXXXX";
+        return mkdtemp(path.data());
+    }
+    TAVSearchRequest search(std::string query, std::int64_t queryId)
+    {
+        TAVSearchRequest request;
+        request.queryString = std::move(query);
+        request.queryId = queryId;
+        return request;
+    }
+
+    const std::string directory = temporaryDirectory();
+    platform::RunLoop loop;
+    platform::WorkerPool pool{2};
+    platform::test::ManualClock clock;
+    std::shared_ptr<EchoDaemon> daemon = std::make_shared<EchoDaemon>();
+    std::unique_ptr<platform::ipc::Transport> transport;
+    std::unique_ptr<platform::ipc::Listener> listener, endpoint;
+    std::vector<std::shared_ptr<platform::ipc::Connection>> connections;
+    std::thread thread;
+    std::unique_ptr<TAVClient> client;
+};
+
+TEST_F(ClientTest, EveryOperationCrossesBothWays)
+{
+    std::optional<TAVBagAnswer> pushed;
+    client->onBagDidLoad([&](TAVBagAnswer answer) { pushed = std::move(answer); });
+    EXPECT_EQ(client->configure({"com.example", "Example/1"}).value(), daemon->endpoint);
+    ASSERT_TRUE(client->wait([&] { return pushed.has_value(); }, 30s));
+    EXPECT_EQ(pushed->bag->version(), "7");
+    EXPECT_EQ(pushed->error, makeTAVError(TAVErrorBagFetch, "Example/1"));
+
+    EXPECT_EQ(client->bag()->bag->rawBag()["version"], Value("7"));
+    const auto answer = client->request(search("grüße", 5)).value();
+    EXPECT_EQ(answer.queryId, 5);
+    EXPECT_EQ(answer.reply->rawResponse->view(), "TAVSearchRequest:grüße");
+    EXPECT_FALSE(answer.error);
+    EXPECT_EQ(client->request(search("fail", 6))->error->reason(), "no URL");
+
+    client->reportEvent("seen", 5, ZRSearchViewAppearFeedback());
+    EXPECT_EQ(client->feedback().value(),
+              Value::Array{Value::dictionaryOf({{"event", "seen 5 ZRSearchViewAppearFeedback"}})});
+    EXPECT_EQ(client->listenToFlusher().value(), "unix:path=/flusher");
+    EXPECT_EQ(client->sessions()->front()["agent"], Value("Example/1"));
+    EXPECT_EQ(client->status().value()["pid"], Value(1));
+    EXPECT_EQ(client->statistics().value(), "# EOF\n");
+
+    const auto resource = client->resource("TAVQIFeatures").value();
+    char content[32] = {};
+    EXPECT_EQ(pread(resource.file.fd(), content, sizeof(content), 0), 13) << "a descriptor of one's own";
+    EXPECT_STREQ(content, "TAVQIFeatures");
+    EXPECT_EQ(resource.attributes["version"], Value(3));
+    const auto missing = client->resource("").value();
+    EXPECT_FALSE(missing.file);
+    EXPECT_EQ(missing.error->code, TAVErrorNotFound);
+
+    auto view = TAVEndpointClient::connect(daemon->endpoint).value();
+    EXPECT_EQ(view->request(TAVMoreResultsRequest(), {"com.example", "Example/1"})->reply->geoSessionEntityString,
+              "com.example");
+}
+
+TEST_F(ClientTest, RequestsAreOutstandingSideBySide)
+{
+    std::vector<std::int64_t> answered;
+    const auto note = [&](platform::Result<TAVAnswer> answer) { answered.push_back(answer->queryId); };
+    client->send(search("hold", 1), note);
+    client->send(search("weather", 2), note);
+    ASSERT_TRUE(client->wait([&] { return answered.size() == 2; }, 30s));
+    EXPECT_EQ(answered, (std::vector<std::int64_t>{-1, 2}));
+}
+
+TEST_F(ClientTest, ARefusedConfigurationClosesTheConnection)
+{
+    const auto endpoint = client->configure({});
+    ASSERT_FALSE(endpoint);
+    EXPECT_FALSE(client->connected());
+    EXPECT_EQ(endpoint.error().domain, TAVClientErrorDomain);
+    EXPECT_FALSE(client->bag()) << "a call on a closed connection fails, and doesn't wait";
+}
+
+TEST_F(ClientTest, SilenceEndsInATimeOut)
+{
+    client->setTimeout(20ms);
+    const auto answer = client->request(search("silence", 1));
+    ASSERT_FALSE(answer);
+    EXPECT_THAT(answer.error().reason(), testing::HasSubstr("no answer to Request within 0.02 s"));
+}
+
+TEST(Client, WithoutADaemonSaysWhereItLooked)
+{
+    const auto client = TAVClient::connect("unix:path=/nowhere/socket");
+    ASSERT_FALSE(client);
+    EXPECT_THAT(client.error().reason(), testing::HasSubstr("/nowhere/socket"));
+}
+
+} // namespace
+} // namespace tavrin::test
