@@ -249,7 +249,7 @@ Value TavrinBagController::cacheBagDictionary(const Value& fetched)
     if (!list)
         log().error("Error writing bag to persistent cache: {}.", list.error().description());
     else if (auto written = _assembly.fileManager.writeAtomically(*path, *list); !written)
-        log().error("Could not write to {}: {}", *path, written.error().description());
+        log().error("Could not write to {}", *path + " (" + written.error().reason() + ")");
     return bag;
 }
 
