@@ -66,7 +66,7 @@ struct Limits {
     std::size_t queuedBytes = 32u << 20;
     /// Connections open at once on one listener, so that no client takes all descriptors. Past it, new ones wait to be
     /// accepted until one closes.
-    unsigned connections = 256;
+    unsigned connections = 1024;
     /// How long a new peer may take to authenticate, and a closing one to read what was sent before.
     Duration patience = std::chrono::seconds(30);
 };

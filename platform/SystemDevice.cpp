@@ -1,5 +1,7 @@
 #include "platform/SystemDevice.h"
 
+#include <sys/resource.h>
+
 #include "platform/Clock.h"
 #include "platform/Counters.h"
 #include "platform/Device.h"
@@ -71,9 +73,24 @@ struct SystemDevice::Impl {
     Device device;
 };
 
+namespace {
+
+/// Every client takes a descriptor, and the usual soft limit is made for select(), which is used nowhere here.
+void raiseDescriptorLimit()
+{
+    rlimit limit{};
+    if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
+    limit.rlim_cur = limit.rlim_max;
+    setrlimit(RLIMIT_NOFILE, &limit);
+}
+
+} // namespace
+
 SystemDevice::SystemDevice(RunLoop& runLoop, const std::string& name, const std::string& sharedSuite)
-    : _impl(std::make_unique<Impl>(runLoop, name, sharedSuite))
-{}
+{
+    raiseDescriptorLimit();
+    _impl = std::make_unique<Impl>(runLoop, name, sharedSuite);
+}
 
 SystemDevice::~SystemDevice() = default;
 

@@ -13,7 +13,7 @@ class RunLoop;
 class SystemDevice {
 public:
     /// `name` names the daemon's files and folders in the user's directories, `sharedSuite` the defaults shared with
-    /// clients. The run loop must outlive it.
+    /// clients. The run loop must outlive it. The process may open as many files as the system lets it.
     SystemDevice(RunLoop& runLoop, const std::string& name, const std::string& sharedSuite);
     ~SystemDevice();
     [[nodiscard]] Device& device();

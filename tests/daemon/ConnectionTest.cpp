@@ -91,6 +91,28 @@ TEST_F(ConnectionTest, AnUnconfiguredConnectionIsServedWhatNeedsNoClient)
     EXPECT_TRUE(daemon->service->getClientConnections().empty());
 }
 
+TEST_F(ConnectionTest, ACallerWithOneCallIntroducesItselfInsideItsRequest)
+{
+    const auto ask = [&](Value configuration) {
+        auto connection = connect();
+        auto call = connection->call("Request", {Value::dictionaryOf({{"class", "TAVSearchRequest"},
+                                                                      {"queryString", "weat"},
+                                                                      {"queryId", 1},
+                                                                      {"configuration", std::move(configuration)}})});
+        device.drain();
+        return std::pair(connection, call);
+    };
+    const auto [connection, call] = ask(Value::dictionaryOf({{"class", "TAVSessionConfiguration"},
+                                                             {"identifier", "com.quorvane.vistrel"},
+                                                             {"userAgent", "Vistrel/4"}}));
+    lastTask()->respond(200, "[]");
+    device.drain();
+    EXPECT_EQ(call->argument(1)["class"], Value("TAVReply"));
+
+    const auto [refused, unanswered] = ask(Value::dictionaryOf({{"class", "TAVSessionConfiguration"}}));
+    EXPECT_TRUE(refused->invalidated());
+}
+
 TEST_F(ConnectionTest, MalformedCallsAreRefusedAndTheConnectionLivesOn)
 {
     auto connection = client();

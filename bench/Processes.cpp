@@ -1,0 +1,146 @@
+// What the daemon costs as a process: its start, its memory, its clients that wait, and its sleep.
+
+#include <algorithm>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <poll.h>
+
+#include <fmt/format.h>
+
+#include "CoreTavrin/TAVProtocols.h"
+#include "CoreTavrin/TAVReply.h"
+#include "CoreTavrin/TAVRequest.h"
+#include "bench/Support.h"
+
+namespace tavrin::bench {
+
+namespace {
+
+/// The sum of the numbers that follow `key` in a file of /proc, in the unit that it has there.
+std::uint64_t numberIn(const std::filesystem::path& path, std::string_view key)
+{
+    std::ifstream file(path);
+    std::uint64_t sum = 0;
+    for (std::string line; std::getline(file, line);)
+        if (line.starts_with(key)) sum += std::strtoull(line.c_str() + key.size(), nullptr, 10);
+    return sum;
+}
+
+double privateDirtyMegabytes(pid_t pid)
+{
+    return static_cast<double>(numberIn(fmt::format("/proc/{}/smaps_rollup", pid), "Private_Dirty:")) / 1024;
+}
+
+std::uint64_t contextSwitches(pid_t pid)
+{
+    std::uint64_t sum = 0;
+    for (const auto& task : std::filesystem::directory_iterator(fmt::format("/proc/{}/task", pid)))
+        sum += numberIn(task.path() / "status", "voluntary_ctxt_switches:") +
+               numberIn(task.path() / "status", "nonvoluntary_ctxt_switches:");
+    return sum;
+}
+
+void pass(double duration)
+{
+    poll(nullptr, 0, static_cast<int>(duration * 1000));
+}
+
+/// A call that needs neither configuration nor bag, on a connection of its own.
+double startToFirstAnswer(const std::string& program)
+{
+    const double begin = now();
+    const Daemon daemon("http://127.0.0.1:9/bag", {}, program);
+    const auto client = TAVClient::connect(daemon.address());
+    if (!client || !(*client)->sessions()) std::abort();
+    return now() - begin;
+}
+
+} // namespace
+
+std::vector<Row> startUp()
+{
+    Row row = compare(
+        "start to first answered call, beside a program with the same libraries", 100, 1.5,
+        [] { return startToFirstAnswer(TAVRIND); }, [] { return startToFirstAnswer(BASELINE); });
+    std::vector<double> starts;
+    for (int i = 0; i < 21; ++i) starts.push_back(startToFirstAnswer(TAVRIND) * 1000);
+    return {row, {"the same, in milliseconds", fmt::format("{:.1f} ms", median(starts)), "", median(starts), 40, "ms"}};
+}
+
+std::vector<Row> memory()
+{
+    Process service({DEVSERVER, "--http-port", "0", "--https-port", "0", "--cert-dir",
+                     (std::filesystem::temp_directory_path() / "tavrin-bench-certificate").string(), "--quiet"},
+                    {});
+    const auto ready = platform::parseJson(service.firstLine()).value();
+    const Daemon daemon(*ready["https"].asString() + "/bag", {"SSL_CERT_FILE=" + *ready["ca"].asString()});
+    const auto client = daemon.client();
+    const double afterBag = privateDirtyMegabytes(daemon.pid());
+
+    static constexpr const char* kQueries[] = {"weather", "zürich", "music", "soup", "film", "train", "cat", "app"};
+    std::int64_t queryId = 0;
+    const auto searchUntil = [&](std::int64_t last) {
+        while (queryId < last) {
+            auto request = TAVSearchRequest::searchRequestWithString(kQueries[queryId % std::size(kQueries)],
+                                                                     StartSearchTrigger::NewCharacter);
+            request->queryItems.push_back(std::make_shared<TAVQueryItem>("n", std::to_string(queryId)));
+            request->queryId = ++queryId;
+            request->scale = 1;
+            request->keyboardInputMode = "en";
+            const auto answer = client->request(*request);
+            if (!answer || !answer->reply) std::abort();
+            if (queryId % 500 == 0) std::fprintf(stderr, "\rmemory: %lld searches ", static_cast<long long>(queryId));
+        }
+        return privateDirtyMegabytes(daemon.pid());
+    };
+    const double early = searchUntil(5000);
+    const double late = searchUntil(10'000);
+    std::fputc('\n', stderr);
+    return {{"private dirty memory after the first HTTPS bag", fmt::format("{:.1f} MB", afterBag), "", afterBag, 8, "MB"},
+            {"its growth between 5,000 and 10,000 searches",
+             fmt::format("{:.2f} → {:.2f} MB", early, late), "", late - early, 0.2, "MB"}};
+}
+
+std::vector<Row> waiters()
+{
+    constexpr int kClients = 500;
+    std::fprintf(stderr, "waiters: %d clients\n", kClients);
+    const Service silent(1000, -1);
+    const Daemon daemon(silent.url("/bag"));
+    std::vector<std::unique_ptr<TAVClient>> clients;
+    for (int i = 0; i < kClients; ++i) clients.push_back(daemon.client(false));
+
+    std::vector<double> waits;
+    for (const auto& client : clients) {
+        auto request = TAVSearchRequest::searchRequestWithString("weather", StartSearchTrigger::NewCharacter);
+        request->queryId = 1;
+        client->send(*request, [&waits, begin = now()](const platform::Result<TAVAnswer>& answer) {
+            if (!answer || !answer->error) std::abort();
+            waits.push_back(now() - begin);
+        });
+        client->wait([] { return true; }, {});
+    }
+    // One thread stands for all clients; an answer counts from its request to when this thread gets to it.
+    for (const auto& client : clients) {
+        const std::size_t before = waits.size();
+        if (!client->wait([&] { return waits.size() > before; }, std::chrono::seconds(10))) std::abort();
+    }
+    const double slowest = std::ranges::max(waits);
+    return {{"500 clients wait for the first bag: the slowest answer", fmt::format("{:.2f} s", slowest), "", slowest, 1.2, "s"}};
+}
+
+std::vector<Row> idle()
+{
+    std::fprintf(stderr, "idle: 60 s\n");
+    const Service service(1000);
+    const Daemon daemon(service.url("/bag"));
+    const auto client = daemon.client();
+    pass(15); // connections are dropped after 10 s without use
+    const std::uint64_t before = contextSwitches(daemon.pid());
+    pass(60);
+    const auto wakeUps = static_cast<double>(contextSwitches(daemon.pid()) - before);
+    return {{"context switches of all threads in 60 idle seconds", fmt::format("{:.0f}", wakeUps), "", wakeUps, 0, ""}};
+}
+
+} // namespace tavrin::bench

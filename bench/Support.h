@@ -1,0 +1,110 @@
+#pragma once
+
+#include <atomic>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+#include <sys/types.h>
+#include <thread>
+#include <vector>
+
+#include "CoreTavrin/TAVClient.h"
+
+namespace tavrin::bench {
+
+/// Seconds on the monotonic clock.
+[[nodiscard]] double now();
+[[nodiscard]] double median(std::vector<double> values);
+
+/// One line of the report: a figure of ours beside what it is compared with.
+struct Row {
+    std::string what;
+    std::string ours;
+    std::string beside; ///< empty: compared with nothing
+    double figure = 0;  ///< the ratio, or the figure itself
+    double limit = 0;   ///< at most
+    std::string unit;   ///< of figure and limit; "×" for a ratio
+};
+
+/// Runs `ours` and `beside` in turn, `rounds` times each, and compares the medians of what they return (seconds).
+[[nodiscard]] Row compare(std::string what, int rounds, double limit, const std::function<double()>& ours,
+                          const std::function<double()>& beside);
+
+/// "12.3 µs", "4.5 ms".
+[[nodiscard]] std::string seconds(double value);
+
+/// Keeps this process and those that it starts on one core, until destroyed.
+class OneCore {
+public:
+    OneCore();
+    ~OneCore();
+};
+
+/// A child process; killed when destroyed.
+class Process {
+public:
+    /// `environment` is added to our own. A listening socket is passed on as a service manager does.
+    Process(const std::vector<std::string>& command, const std::vector<std::string>& environment,
+            std::optional<int> listeningSocket = std::nullopt);
+    ~Process();
+    Process(const Process&) = delete;
+    Process& operator=(const Process&) = delete;
+    [[nodiscard]] pid_t pid() const { return _pid; }
+    /// The first line that it writes to standard output; exits where there is none.
+    [[nodiscard]] std::string firstLine();
+
+private:
+    pid_t _pid = -1;
+    int _output = -1;
+};
+
+/// A Unix socket in the listening state.
+[[nodiscard]] int listenAt(const std::string& path);
+
+/// Private directories and a daemon in them, on a socket of ours. The daemon is `program`, tavrind if not given.
+class Daemon {
+public:
+    explicit Daemon(const std::string& bagURL, const std::vector<std::string>& environment = {},
+                    const std::string& program = TAVRIND);
+    ~Daemon();
+    [[nodiscard]] std::string address() const { return "unix:path=" + _socketPath; }
+    [[nodiscard]] pid_t pid() const { return _process->pid(); }
+    /// A client that has configured itself; waits until it has the bag, where `withBag`.
+    [[nodiscard]] std::unique_ptr<TAVClient> client(bool withBag = true) const;
+
+private:
+    std::string _home;
+    std::string _socketPath;
+    std::unique_ptr<Process> _process;
+};
+
+/// A search service over HTTP on loopback: a bag at /bag, and the same JSON answer of `answerSize` bytes for everything
+/// else, `delay` seconds late. A negative delay never answers anything.
+class Service {
+public:
+    explicit Service(std::size_t answerSize, double delay = 0);
+    ~Service();
+    [[nodiscard]] std::string url(const std::string& path) const;
+    void setDelay(double delay) { _delay = delay; }
+
+private:
+    void serve(int connection);
+    int _listener = -1;
+    int _wake[2] = {-1, -1};
+    unsigned _port = 0;
+    std::string _answer;
+    std::atomic<double> _delay;
+    std::thread _acceptor;
+    std::vector<std::thread> _threads;
+};
+
+// The benchmarks. Each prints what it is doing to standard error.
+[[nodiscard]] std::vector<Row> ipc();
+[[nodiscard]] std::vector<Row> search();
+[[nodiscard]] std::vector<Row> startUp();
+[[nodiscard]] std::vector<Row> memory();
+[[nodiscard]] std::vector<Row> waiters();
+[[nodiscard]] std::vector<Row> idle();
+
+} // namespace tavrin::bench
