@@ -13,16 +13,17 @@ std::shared_ptr<platform::UrlTask> dataTaskWithRetryableRequest(platform::Device
                                                                 TAVRetryableNetworkRequest request, unsigned attempt,
                                                                 unsigned retriesLeft, RetryCompletion completion)
 {
-    // The completion reads its own task's timing data.
-    auto cell = std::make_shared<std::shared_ptr<platform::UrlTask>>();
+    // The completion reads its own task's timing data. The task owns the completion, and lives until that has run.
+    auto cell = std::make_shared<std::weak_ptr<platform::UrlTask>>();
     const platform::UrlRequest httpRequest = request.httpRequest;
     auto task = session->dataTask(
         httpRequest, [&device, session, request = std::move(request), attempt, retriesLeft, cell,
                       completion = std::move(completion)](auto data, auto response, auto error) mutable {
-            const auto finished = std::exchange(*cell, nullptr);
+            const auto finished = cell->lock();
+            const platform::Value timingData = finished ? finished->timingData() : platform::Value();
             const platform::Date deadline = request.expire.value_or(platform::Date());
             if (!error || device.clock.wallNow() > deadline || retriesLeft == 0)
-                return completion(std::move(data), std::move(response), std::move(error), finished->timingData());
+                return completion(std::move(data), std::move(response), std::move(error), timingData);
 
             const platform::Duration delay = request.delayOnFail ? kDelayOnFail : platform::Duration::zero();
             device.globalQueue(platform::Priority::High)

@@ -46,10 +46,18 @@ public:
 
 /// The whole daemon on a device of twins: the test is the clients, the service and the clock.
 struct DaemonTest : testing::Test {
-    ~DaemonTest() override { device.drain(); }
+    ~DaemonTest() override { settle(); }
+
+    /// Lets everything under way end.
+    void settle()
+    {
+        do device.drain();
+        while (device.loader.cancelAll());
+    }
 
     void start()
     {
+        settle();
         daemon.reset();
         device.drain();
         device.loader.sessions.clear();

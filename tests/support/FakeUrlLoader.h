@@ -75,6 +75,19 @@ public:
         return sessions.back();
     }
 
+    /// Cancels what is unanswered, and says whether there was any: an unanswered task keeps its session.
+    bool cancelAll()
+    {
+        bool any = false;
+        for (const auto& session : sessions) {
+            for (const auto& task : std::vector(session->tasks)) {
+                any = any || !task->finished;
+                task->cancel();
+            }
+        }
+        return any;
+    }
+
     /// In the order in which they were made.
     std::vector<std::shared_ptr<Session>> sessions;
 };
