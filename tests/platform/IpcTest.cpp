@@ -442,23 +442,26 @@ TEST(Ipc, EndpointsAreApartFromEachOtherAndGoWithTheirListener)
     EXPECT_TRUE(call(*client, method("Count"))) << "a connection outlives its listener";
 }
 
-TEST(Ipc, ConnectionsBeyondWhatFitsWaitForTheirTurn)
+TEST(Ipc, ConnectionsBeyondTheLimitWaitForTheirTurn)
 {
     Service service({.connections = 1});
-    std::promise<void> starved;
-    int starvations = 0;
-    LogTap tap([&](const LogLine& line) {
-        if (line.text.find("can't accept") != std::string::npos && ++starvations == 1) starved.set_value();
-    });
     auto first = service.connect();
     const FileHandle second = rawConnection(service);
     service.settle();
     EXPECT_EQ(service.connections.size(), 1u);
     first.reset();
     service.await([&] { return service.connections.size() == 2; });
+}
 
-    service.connections[1]->invalidate();
-    service.await([&] { return service.notes.size() == 2; });
+#ifndef __SANITIZE_ADDRESS__ // its checks take descriptors of their own
+TEST(Ipc, AProcessShortOfDescriptorsAcceptsLater)
+{
+    Service service;
+    std::promise<void> starved;
+    int starvations = 0;
+    LogTap tap([&](const LogLine& line) {
+        if (line.text.find("can't accept") != std::string::npos && ++starvations == 1) starved.set_value();
+    });
     rlimit before{};
     getrlimit(RLIMIT_NOFILE, &before);
     const rlimit none{1, before.rlim_max};
@@ -472,8 +475,9 @@ TEST(Ipc, ConnectionsBeyondWhatFitsWaitForTheirTurn)
     setrlimit(RLIMIT_NOFILE, &before);
     EXPECT_EQ(starvations, 1);
     service.clock.advance(1s, [&] { service.settle(); });
-    service.await([&] { return service.connections.size() == 3; });
+    service.await([&] { return service.connections.size() == 1; });
 }
+#endif
 
 TEST(ListenSocket, TakesOverFromTheDeadOnly)
 {
