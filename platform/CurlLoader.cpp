@@ -21,6 +21,9 @@ namespace platform {
 
 namespace {
 
+/// Of one load, over all its hops. libcurl refuses a single line beyond 100 KiB.
+constexpr std::size_t kMaximumHeaderSize = 256u << 10;
+
 class CurlTask;
 
 /// The URL-loading thread. Everything with "loader thread" in its comment belongs to it alone.
@@ -69,12 +72,18 @@ public:
 
     void resume() override
     {
-        if (!_resumed.exchange(true)) _loader->start(shared_from_this());
+        if (!_started.exchange(true)) _loader->start(shared_from_this());
     }
     void cancel() override
     {
-        if (_resumed) _loader->cancel(shared_from_this());
+        _cancelled = true;
+        if (_started.exchange(true))
+            _loader->cancel(shared_from_this());
+        else
+            complete(CURLE_OK, true);
     }
+    /// True for a task that was cancelled before the loader began it.
+    [[nodiscard]] bool cancelled() const { return _cancelled; }
     [[nodiscard]] std::uint64_t identifier() const override { return _identifier; }
     [[nodiscard]] const UrlRequest& originalRequest() const override { return _request; }
     [[nodiscard]] Value timingData() const override
@@ -101,6 +110,9 @@ private:
     std::size_t received(std::string_view bytes);
     std::size_t receivedHeader(std::string_view line);
     int mayConnect(const char* address);
+    [[nodiscard]] long hop() const;
+    void noteMarks();
+    [[nodiscard]] Error unsupported() const;
 
     std::shared_ptr<Loader> _loader;
     const std::uint64_t _identifier;
@@ -108,7 +120,8 @@ private:
     const UrlSessionConfiguration _configuration;
     UrlSession::DataCompletion _completion;
     std::shared_ptr<Queue> _delegateQueue;
-    std::atomic<bool> _resumed = false;
+    std::atomic<bool> _started = false; // handed to the loader, or ended without it
+    std::atomic<bool> _cancelled = false;
 
     CURL* _easy = nullptr;
     curl_slist* _headerList = nullptr;
@@ -116,7 +129,12 @@ private:
     double _start = 0; // on the monotonic clock
     std::string _body;
     HttpHeaders _headers;
+    std::size_t _headerSize = 0; // of all hops
     bool _tooLarge = false;
+    std::optional<long> _sentHop; // the last hop whose request was sent
+    long _markedHop = 0;
+    TransferMarks _marks;       // by the end of that hop
+    TransferMarks _earlierHops; // by the end of the one before
     std::optional<bool> _firstHopPublic;
     bool _forbiddenHop = false;
     std::array<char, CURL_ERROR_SIZE> _errorText{};
@@ -145,7 +163,13 @@ std::size_t CurlTask::received(std::string_view bytes)
 std::size_t CurlTask::receivedHeader(std::string_view line)
 {
     progressed();
+    _headerSize += line.size();
+    if (_headerSize > kMaximumHeaderSize) {
+        _tooLarge = true;
+        return 0;
+    }
     if (line.starts_with("HTTP/")) {
+        noteMarks();
         _headers = {}; // of a redirect, or of an interim answer
         _body.clear();
         return line.size();
@@ -160,9 +184,36 @@ std::size_t CurlTask::receivedHeader(std::string_view line)
     return line.size();
 }
 
+long CurlTask::hop() const
+{
+    long redirects = 0;
+    curl_easy_getinfo(_easy, CURLINFO_REDIRECT_COUNT, &redirects);
+    return redirects;
+}
+
+/// libcurl adds up the marks of all hops; what the earlier ones took is kept, to be subtracted.
+void CurlTask::noteMarks()
+{
+    if (const long now = hop(); now != _markedHop) {
+        _markedHop = now;
+        _earlierHops = _marks;
+    }
+    _marks = transferMarks(_easy);
+}
+
+/// libcurl has one code for three faults.
+Error CurlTask::unsupported() const
+{
+    if (!_sentHop) return urlErrorFromCurl(CURLE_UNSUPPORTED_PROTOCOL, _errorText.data());
+    if (hop() > *_sentHop)
+        return urlError(kUrlForbiddenRedirect, fmt::format("redirected to another scheme: {}", _errorText.data()));
+    return urlError(kUrlBadResponse, fmt::format("the answer isn't HTTP: {}", _errorText.data()));
+}
+
 /// A public host must not lead us, by a redirect, to an address of the inner network.
 int CurlTask::mayConnect(const char* address)
 {
+    _sentHop = hop();
     const bool isPublic = isPublicAddress(address);
     if (!_firstHopPublic) _firstHopPublic = isPublic;
     _forbiddenHop = *_firstHopPublic && !isPublic;
@@ -222,14 +273,18 @@ bool CurlTask::configure(CURL* handle)
         curl_slist* extended = curl_slist_append(_headerList, line.c_str());
         if (extended) _headerList = extended;
     }
-    if (_request.method != "GET") set(CURLOPT_CUSTOMREQUEST, _request.method.c_str());
-    if (!_request.body.empty() || _request.method == "POST") {
+    const bool hasBody = !_request.body.empty() || _request.method == "POST";
+    if (hasBody) {
         set(CURLOPT_POST, 1L);
         set(CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(_request.body.size()));
         set(CURLOPT_POSTFIELDS, _request.body.empty() ? "" : _request.body.data());
         curl_slist* extended = curl_slist_append(_headerList, "Expect:");
         if (extended) _headerList = extended;
     }
+    if (_request.method == "HEAD") set(CURLOPT_NOBODY, 1L);
+    // Only where it must be: libcurl keeps to a method that was forced, even where a redirect turns POST into GET.
+    else if (_request.method != (hasBody ? "POST" : "GET"))
+        set(CURLOPT_CUSTOMREQUEST, _request.method.c_str());
     set(CURLOPT_HTTPHEADER, _headerList);
     return set(CURLOPT_URL, _request.url.string().c_str());
 }
@@ -245,9 +300,13 @@ void CurlTask::complete(CURLcode code, bool cancelled)
     else if (timedOut)
         error = urlError(kUrlTimedOut, fmt::format("nothing received for {:g} s", toSeconds(timeout())));
     else if (_tooLarge)
-        error = urlError(kUrlTooLarge, fmt::format("more than {} bytes", _configuration.maximumResponseSize));
+        error = urlError(kUrlTooLarge, _headerSize > kMaximumHeaderSize
+                                           ? fmt::format("more than {} bytes of header fields", kMaximumHeaderSize)
+                                           : fmt::format("more than {} bytes", _configuration.maximumResponseSize));
     else if (_forbiddenHop)
         error = urlError(kUrlForbiddenRedirect, "redirected to a private address");
+    else if (code == CURLE_UNSUPPORTED_PROTOCOL)
+        error = unsupported();
     else if (code != CURLE_OK)
         error = urlErrorFromCurl(code, _errorText.data());
 
@@ -262,8 +321,9 @@ void CurlTask::complete(CURLcode code, bool cancelled)
                                    .statusCode = static_cast<int>(status),
                                    .headers = std::move(_headers)};
         }
+        noteMarks();
         std::lock_guard lock(_timingMutex);
-        _timing = timingDataOf(_easy, _start);
+        _timing = timingDataOf(_easy, _start, _earlierHops);
     }
     if (!error) data = Bytes(std::move(_body));
     _easy = nullptr;
@@ -340,6 +400,7 @@ void Loader::takeCommands()
 
 void Loader::begin(const std::shared_ptr<CurlTask>& task)
 {
+    if (task->cancelled()) return task->complete(CURLE_OK, true);
     CURL* easy = takeEasy();
     if (!easy || !task->configure(easy) || curl_multi_add_handle(_multi, easy) != CURLM_OK) {
         task->complete(CURLE_FAILED_INIT, false);

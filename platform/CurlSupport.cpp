@@ -48,17 +48,32 @@ Error urlErrorFromCurl(CURLcode code, const char* detail)
     return urlError(mapped(), std::move(reason));
 }
 
+namespace {
+
+/// Where an IPv6 address holds the IPv4 address that it stands for: mapped, compatible, behind NAT64 (RFC 6052) or
+/// 6to4 (RFC 3056); null for others.
+const unsigned char* embeddedIPv4(const in6_addr& v6)
+{
+    constexpr unsigned char kNat64[12]{0, 0x64, 0xff, 0x9b};
+    if (IN6_IS_ADDR_V4MAPPED(&v6) || IN6_IS_ADDR_V4COMPAT(&v6) || std::memcmp(v6.s6_addr, kNat64, sizeof kNat64) == 0)
+        return v6.s6_addr + 12;
+    return v6.s6_addr[0] == 0x20 && v6.s6_addr[1] == 0x02 ? v6.s6_addr + 2 : nullptr;
+}
+
+} // namespace
+
 bool isPublicAddress(const std::string& address)
 {
     in_addr v4{};
     in6_addr v6{};
     if (inet_pton(AF_INET6, address.c_str(), &v6) == 1) {
-        if (!IN6_IS_ADDR_V4MAPPED(&v6)) {
+        const unsigned char* embedded = embeddedIPv4(v6);
+        if (!embedded) {
             const bool uniqueLocal = (v6.s6_addr[0] & 0xfe) == 0xfc;
             return !(IN6_IS_ADDR_LOOPBACK(&v6) || IN6_IS_ADDR_UNSPECIFIED(&v6) || IN6_IS_ADDR_LINKLOCAL(&v6) ||
                      uniqueLocal);
         }
-        std::memcpy(&v4, v6.s6_addr + 12, sizeof v4);
+        std::memcpy(&v4, embedded, sizeof v4);
     } else if (inet_pton(AF_INET, address.c_str(), &v4) != 1) {
         return false;
     }
@@ -68,15 +83,7 @@ bool isPublicAddress(const std::string& address)
              within(0xa9fe0000, 16) || within(0x64400000, 10) || within(0x00000000, 8));
 }
 
-double monotonicSeconds()
-{
-    return std::chrono::duration<double>(std::chrono::steady_clock::now().time_since_epoch()).count();
-}
-
-namespace {
-
-/// The peer as a socket address: length, family (2 or 30), port, and the address from byte 4 (IPv4) or 8 (IPv6).
-std::string peerAddress(const std::string& ip, long port)
+std::string socketAddress(const std::string& ip, long port)
 {
     const auto put = [&](std::string& address, std::size_t length, char family) {
         address.assign(length, '\0');
@@ -96,6 +103,20 @@ std::string peerAddress(const std::string& ip, long port)
         std::memcpy(address.data() + 8, &v6, sizeof v6);
     }
     return address;
+}
+
+double monotonicSeconds()
+{
+    return std::chrono::duration<double>(std::chrono::steady_clock::now().time_since_epoch()).count();
+}
+
+namespace {
+
+double seconds(CURL* easy, CURLINFO info)
+{
+    curl_off_t microseconds = 0;
+    curl_easy_getinfo(easy, info, &microseconds);
+    return static_cast<double>(microseconds) / 1e6;
 }
 
 /// The name of the interface that has this address.
@@ -121,48 +142,54 @@ std::string interfaceOf(const std::string& localIp)
 
 } // namespace
 
-Value timingDataOf(CURL* easy, double start)
+TransferMarks transferMarks(CURL* easy)
 {
-    // Marks count from the start of the last hop; a stage that wasn't needed is as old as the one before.
-    const auto mark = [&](CURLINFO info) {
-        curl_off_t microseconds = 0;
-        curl_easy_getinfo(easy, info, &microseconds);
-        return static_cast<double>(microseconds) / 1e6;
-    };
+    long connections = 0;
+    curl_easy_getinfo(easy, CURLINFO_NUM_CONNECTS, &connections);
+    return {.lookup = seconds(easy, CURLINFO_NAMELOOKUP_TIME_T),
+            .connected = seconds(easy, CURLINFO_CONNECT_TIME_T),
+            .secured = seconds(easy, CURLINFO_APPCONNECT_TIME_T),
+            .ready = seconds(easy, CURLINFO_PRETRANSFER_TIME_T),
+            .firstByte = seconds(easy, CURLINFO_STARTTRANSFER_TIME_T),
+            .connections = connections};
+}
+
+Value timingDataOf(CURL* easy, double start, const TransferMarks& earlierHops)
+{
     const auto text = [&](CURLINFO info) {
         char* value = nullptr;
         curl_easy_getinfo(easy, info, &value);
         return std::string(value ? value : "");
     };
-    const double redirects = mark(CURLINFO_REDIRECT_TIME_T);
-    const double lookup = mark(CURLINFO_NAMELOOKUP_TIME_T);
-    const double connected = mark(CURLINFO_CONNECT_TIME_T);
-    const double secured = mark(CURLINFO_APPCONNECT_TIME_T);
-    const double ready = mark(CURLINFO_PRETRANSFER_TIME_T);
-    const double firstByte = mark(CURLINFO_STARTTRANSFER_TIME_T);
-    const double total = mark(CURLINFO_TOTAL_TIME_T);
-    long newConnections = 0;
+    const TransferMarks marks = transferMarks(easy);
+    const double redirects = seconds(easy, CURLINFO_REDIRECT_TIME_T);
+    const double total = seconds(easy, CURLINFO_TOTAL_TIME_T);
     long port = 0;
-    curl_easy_getinfo(easy, CURLINFO_NUM_CONNECTS, &newConnections);
     curl_easy_getinfo(easy, CURLINFO_PRIMARY_PORT, &port);
-    const bool reused = newConnections == 0;
+    const bool reused = marks.connections == earlierHops.connections && marks.ready > earlierHops.ready;
 
-    const auto at = [&](double offset, bool happened = true) { return happened && offset > 0 ? start + offset : 0.0; };
+    // 0 is a stage that didn't happen. One that wasn't needed is as old as the one before.
+    const auto at = [&](double TransferMarks::*mark, bool happened = true) {
+        const double offset = marks.*mark - earlierHops.*mark;
+        return happened && offset > 0 ? start + redirects + offset : 0.0;
+    };
+    const double connected = at(&TransferMarks::connected, !reused);
+    const double secured = at(&TransferMarks::secured, !reused);
     Dictionary timing{{"_kCFNTimingDataFetchStart", start},
                       {"_kCFNTimingDataRedirectStart", redirects > 0 ? start : 0.0},
-                      {"_kCFNTimingDataRedirectEnd", at(redirects)},
+                      {"_kCFNTimingDataRedirectEnd", redirects > 0 ? start + redirects : 0.0},
                       {"_kCFNTimingDataDomainLookupStart", reused ? 0.0 : start + redirects},
-                      {"_kCFNTimingDataDomainLookupEnd", at(lookup, !reused)},
-                      {"_kCFNTimingDataConnectStart", at(lookup, !reused)},
-                      {"_kCFNTimingDataConnectEnd", at(std::max(connected, secured), !reused)},
-                      {"_kCFNTimingDataSecureConnectionStart", at(connected, !reused && secured > 0)},
-                      {"_kCFNTimingDataRequestStart", at(ready)},
-                      {"_kCFNTimingDataResponseStart", at(firstByte)},
-                      {"_kCFNTimingDataResponseEnd", at(total)},
+                      {"_kCFNTimingDataDomainLookupEnd", at(&TransferMarks::lookup, !reused)},
+                      {"_kCFNTimingDataConnectStart", at(&TransferMarks::lookup, !reused)},
+                      {"_kCFNTimingDataConnectEnd", std::max(connected, secured)},
+                      {"_kCFNTimingDataSecureConnectionStart", secured > 0 ? connected : 0.0},
+                      {"_kCFNTimingDataRequestStart", at(&TransferMarks::ready)},
+                      {"_kCFNTimingDataResponseStart", at(&TransferMarks::firstByte)},
+                      {"_kCFNTimingDataResponseEnd", start + total},
                       {"_kCFNTimingDataConnectionReused", reused}};
     if (std::string name = interfaceOf(text(CURLINFO_LOCAL_IP)); !name.empty())
         timing.set("_kCFNTimingDataConnectionInterfaceIdentifier", std::move(name));
-    if (std::string address = peerAddress(text(CURLINFO_PRIMARY_IP), port); !address.empty())
+    if (std::string address = socketAddress(text(CURLINFO_PRIMARY_IP), port); !address.empty())
         timing.set("_kCFNTimingDataConnectionPeerAddress", Bytes(std::move(address)));
     return timing;
 }

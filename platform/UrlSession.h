@@ -122,6 +122,7 @@ struct UrlSessionConfiguration {
     bool pipelining = false; ///< wait for a connection that may be multiplexed rather than open another
     /// Idle connections older than this aren't used again; none is curl's default (118 s).
     std::optional<Duration> connectionPurgeTimeout;
+    /// Bytes of a body, unpacked. Header fields may take 256 KiB in all. More is kUrlTooLarge.
     std::size_t maximumResponseSize = 64u << 20;
     unsigned maximumRedirects = 16;
     /// A PEM file of certification authorities in place of the system's; empty is the system's.
