@@ -1,0 +1,157 @@
+#include <gtest/gtest.h>
+
+#include <set>
+#include <sstream>
+
+#include <fmt/format.h>
+
+#include "platform/CurlSupport.h"
+#include "platform/Files.h"
+#include "tests/support/TestHttpServer.h"
+#include "tests/support/UrlLoads.h"
+
+namespace platform {
+namespace {
+
+using test::always;
+using test::byPath;
+using test::httpAnswer;
+using test::Outcome;
+using test::TestHttpServer;
+using Then = TestHttpServer::Then;
+using TimingDataTest = test::UrlLoads;
+
+TEST_F(TimingDataTest, ConnectionsAreReusedWhileTheyLive)
+{
+    TestHttpServer server(byPath({{"/keep", {httpAnswer(200)}}, {"/close", {httpAnswer(200), Then::Close}}}));
+    const char* const paths[]{"/keep", "/keep", "/close", "/keep"};
+    const bool reused[]{false, true, true, false};
+    for (std::size_t i = 0; i < std::size(paths); ++i) {
+        const Outcome outcome = load(server.url(paths[i])); // a session each: they share connections
+        EXPECT_EQ(outcome.code(), 0) << "a connection that the server has closed is replaced";
+        EXPECT_EQ(outcome.timing["_kCFNTimingDataConnectionReused"], Value(reused[i])) << i;
+    }
+    EXPECT_EQ(server.connections(), 2);
+}
+
+double mark(const Value& timing, std::string_view name)
+{
+    return timing["_kCFNTimingData" + std::string(name)].asDouble().value_or(-1);
+}
+
+TEST_F(TimingDataTest, MarksFollowTheOrderOfTheStages)
+{
+    constexpr const char* kNeverOnReuse[]{"DomainLookupStart", "DomainLookupEnd", "ConnectStart", "ConnectEnd"};
+    TestHttpServer there(always({httpAnswer(200, "there")}));
+    TestHttpServer server(byPath({{"/here", {httpAnswer(200, "here")}},
+                                  {"/to-here", {httpAnswer(302, "", "Location: /here\r\n")}},
+                                  {"/to-there", {httpAnswer(302, "", "Location: " + there.url().string() + "\r\n")}}}));
+    const struct {
+        const char* path;
+        bool redirected, reused;
+        bool cold; // begins without connections
+    } cases[]{{"/here", false, false, true},     {"/here", false, true, false},  {"/to-here", true, true, false},
+              {"/to-there", true, false, false}, {"/to-here", true, true, true}, {"/to-there", true, false, true}};
+    for (const auto& c : cases) {
+        if (c.cold) loader = makeCurlLoader();
+        const double before = monotonicSeconds();
+        const Value timing = load(server.url(c.path)).timing;
+        const double after = monotonicSeconds();
+        for (const auto& [key, value] : *timing.asDictionary()) EXPECT_TRUE(key.starts_with("_kCFNTimingData")) << key;
+
+        std::vector<const char*> order{"FetchStart"};
+        if (c.redirected) order.insert(order.end(), {"RedirectStart", "RedirectEnd"});
+        if (!c.reused) order.insert(order.end(), std::begin(kNeverOnReuse), std::end(kNeverOnReuse));
+        order.insert(order.end(), {"RequestStart", "ResponseStart", "ResponseEnd"});
+        double last = before;
+        for (const char* name : order) {
+            EXPECT_GE(mark(timing, name), last - 1e-6) << c.path << ": " << name; // libcurl counts microseconds
+            last = mark(timing, name);
+        }
+        EXPECT_LE(last, after + 1e-6);
+        for (const char* name : kNeverOnReuse) EXPECT_EQ(mark(timing, name) == 0.0, c.reused) << c.path << ": " << name;
+        EXPECT_EQ(mark(timing, "RedirectEnd") > 0.0, c.redirected) << c.path;
+        EXPECT_EQ(mark(timing, "SecureConnectionStart"), 0.0) << "no TLS here";
+        EXPECT_EQ(timing["_kCFNTimingDataConnectionInterfaceIdentifier"], Value("lo"));
+    }
+}
+
+/// The cells of every table row of the page, without backquotes.
+std::vector<std::vector<std::string>> rowsOf(const std::string& page)
+{
+    std::vector<std::vector<std::string>> rows;
+    std::istringstream lines(page);
+    for (std::string line; std::getline(lines, line);) {
+        if (!line.starts_with("| ")) continue;
+        std::erase(line, '`');
+        std::vector<std::string> cells;
+        for (std::size_t at = 2, end = 0; (end = line.find(" |", at)) != std::string::npos; at = end + 3)
+            cells.push_back(line.substr(at, end - at));
+        rows.push_back(std::move(cells));
+    }
+    return rows;
+}
+
+TEST_F(TimingDataTest, ALoadThatFailedSaysHowFarItCame)
+{
+    TestHttpServer server(always({"", Then::Close}));
+    Url closed;
+    {
+        const TestHttpServer gone(always({}));
+        closed = gone.url();
+    }
+    const struct {
+        Url url;
+        std::set<std::string> marks;
+    } cases[]{
+        {closed, {"DomainLookupStart", "DomainLookupEnd", "ConnectStart"}},
+        {server.url(),
+         {"DomainLookupStart", "DomainLookupEnd", "ConnectStart", "ConnectEnd", "RequestStart", "ResponseStart"}},
+    };
+    for (const auto& c : cases) {
+        const Outcome outcome = load(c.url);
+        EXPECT_TRUE(outcome.error);
+        EXPECT_EQ(outcome.timing["_kCFNTimingDataConnectionReused"], Value(false)) << c.url.string();
+        std::set<std::string> marks;
+        for (const auto& [key, value] : *outcome.timing.asDictionary())
+            if (value.asDouble().value_or(0) != 0) marks.insert(key.substr(15));
+        EXPECT_TRUE(marks.erase("FetchStart") == 1 && marks.erase("ResponseEnd") == 1);
+        EXPECT_EQ(marks, c.marks) << c.url.string();
+    }
+}
+
+TEST_F(TimingDataTest, TheDocumentNamesEveryKeyAndTheBytesOfAnAddress)
+{
+    const auto page = makeSystemFiles()->read(SOURCE_DIR "/docs/timing.md", 1 << 20);
+    ASSERT_TRUE(page);
+    TestHttpServer server(always({httpAnswer(200)}));
+    const Value timing = load(server.url()).timing;
+    std::set<std::string> keys, documented;
+    for (const auto& [key, value] : *timing.asDictionary()) keys.insert(key);
+    int examples = 0;
+    for (const auto& row : rowsOf(std::string(page->view()))) {
+        if (row[0].starts_with("_kCFNTimingData")) documented.insert(row[0]);
+        const std::string bytes = socketAddress(row[0], atol(row[1].c_str()));
+        if (bytes.empty()) continue;
+        ++examples;
+        std::string hex;
+        for (const unsigned char byte : bytes) hex += fmt::format("{}{:02x}", hex.empty() ? "" : " ", byte);
+        EXPECT_EQ(hex, row[2]) << row[0];
+    }
+    EXPECT_EQ(documented, keys);
+    EXPECT_EQ(examples, 2);
+}
+
+TEST_F(TimingDataTest, PeerAddressIsTheServers)
+{
+    for (const char* address : {"127.0.0.1", "::1"}) {
+        TestHttpServer server(always({httpAnswer(200)}), {.address = address});
+        const Value timing = load(server.url()).timing;
+        const Bytes* bytes = timing["_kCFNTimingDataConnectionPeerAddress"].asBytes();
+        ASSERT_NE(bytes, nullptr);
+        EXPECT_EQ(*bytes, Bytes(socketAddress(address, server.port())));
+    }
+}
+
+} // namespace
+} // namespace platform

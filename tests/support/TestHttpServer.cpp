@@ -1,0 +1,289 @@
+#include "tests/support/TestHttpServer.h"
+
+#include <arpa/inet.h>
+#include <array>
+#include <charconv>
+#include <csignal>
+#include <netinet/in.h>
+#include <poll.h>
+#include <sys/eventfd.h>
+#include <sys/socket.h>
+#include <thread>
+#include <unistd.h>
+
+#include <fmt/format.h>
+#include <gtest/gtest.h>
+#include <openssl/bio.h>
+#include <openssl/evp.h>
+#include <openssl/pem.h>
+#include <openssl/ssl.h>
+#include <openssl/x509v3.h>
+
+#include "platform/Files.h"
+
+namespace platform::test {
+
+namespace {
+
+template <auto Free> struct FreeWith {
+    template <class T> void operator()(T* object) const { Free(object); }
+};
+using SslContext = std::unique_ptr<SSL_CTX, FreeWith<SSL_CTX_free>>;
+using Ssl = std::unique_ptr<SSL, FreeWith<SSL_free>>;
+using Key = std::unique_ptr<EVP_PKEY, FreeWith<EVP_PKEY_free>>;
+using Certificate = std::unique_ptr<X509, FreeWith<X509_free>>;
+
+/// A context with a new key and a certificate for the address; `pem` gets the certificate.
+SslContext makeTls(const std::string& address, std::string& pem)
+{
+    const Key key(EVP_EC_gen("P-256"));
+    const Certificate certificate(X509_new());
+    X509* x509 = certificate.get();
+    X509_set_version(x509, X509_VERSION_3);
+    ASN1_INTEGER_set(X509_get_serialNumber(x509), 1);
+    X509_gmtime_adj(X509_getm_notBefore(x509), -3600);
+    X509_gmtime_adj(X509_getm_notAfter(x509), 3600);
+    X509_set_pubkey(x509, key.get());
+    X509_NAME_add_entry_by_txt(X509_get_subject_name(x509), "CN", MBSTRING_ASC,
+                               reinterpret_cast<const unsigned char*>("test"), -1, -1, 0);
+    X509_set_issuer_name(x509, X509_get_subject_name(x509));
+    const std::unique_ptr<X509_EXTENSION, FreeWith<X509_EXTENSION_free>> name(
+        X509V3_EXT_conf_nid(nullptr, nullptr, NID_subject_alt_name, ("IP:" + address).c_str()));
+    X509_add_ext(x509, name.get(), -1);
+    X509_sign(x509, key.get(), EVP_sha256());
+
+    const std::unique_ptr<BIO, FreeWith<BIO_free_all>> text(BIO_new(BIO_s_mem()));
+    PEM_write_bio_X509(text.get(), x509);
+    char* data = nullptr;
+    const long size = BIO_get_mem_data(text.get(), &data);
+    pem.assign(data, static_cast<std::size_t>(size));
+
+    SslContext context(SSL_CTX_new(TLS_server_method()));
+    SSL_CTX_use_certificate(context.get(), x509);
+    SSL_CTX_use_PrivateKey(context.get(), key.get());
+    return context;
+}
+
+/// The bytes of a request that is whole, or 0.
+std::size_t requestLength(const std::string& bytes, TestHttpServer::Request& request)
+{
+    const std::size_t end = bytes.find("\r\n\r\n");
+    if (end == std::string::npos) return 0;
+    request.head = bytes.substr(0, end + 2);
+    const std::string length = request.header("Content-Length");
+    std::size_t bodyLength = 0;
+    std::from_chars(length.data(), length.data() + length.size(), bodyLength);
+    const std::size_t whole = end + 4 + bodyLength;
+    if (bytes.size() < whole) return 0;
+    const std::size_t space = request.head.find(' ');
+    request.method = request.head.substr(0, space);
+    request.target = request.head.substr(space + 1, request.head.find(' ', space + 1) - space - 1);
+    request.body = bytes.substr(end + 4, bodyLength);
+    return whole;
+}
+
+} // namespace
+
+std::string TestHttpServer::Request::header(std::string_view name) const
+{
+    const std::string start = fmt::format("\r\n{}:", name);
+    std::size_t at = head.find(start);
+    if (at == std::string::npos) return {};
+    at += start.size();
+    while (head[at] == ' ') ++at;
+    return head.substr(at, head.find("\r\n", at) - at);
+}
+
+struct TestHttpServer::Impl {
+    struct Connection {
+        FileHandle socket;
+        Ssl ssl;
+        int number = 0;
+        std::string received;
+    };
+
+    Handler handler;
+    Options options;
+    FileHandle listener;
+    FileHandle wake{eventfd(0, EFD_CLOEXEC)};
+    std::uint16_t port = 0;
+    std::string certificate;
+    SslContext tls;
+    std::map<int, Connection> open; // by descriptor; server's thread
+
+    mutable std::mutex mutex;
+    std::condition_variable arrived;
+    std::vector<Request> requests; // under the mutex
+    int connections = 0;           // under the mutex
+    std::thread thread;
+
+    void listen()
+    {
+        sockaddr_in6 v6{};
+        v6.sin6_family = AF_INET6;
+        sockaddr_in v4{};
+        v4.sin_family = AF_INET;
+        const bool isV6 = inet_pton(AF_INET6, options.address.c_str(), &v6.sin6_addr) == 1;
+        if (!isV6) inet_pton(AF_INET, options.address.c_str(), &v4.sin_addr);
+        auto* address = isV6 ? reinterpret_cast<sockaddr*>(&v6) : reinterpret_cast<sockaddr*>(&v4);
+        socklen_t size = isV6 ? sizeof v6 : sizeof v4;
+        listener = FileHandle(socket(address->sa_family, SOCK_STREAM | SOCK_CLOEXEC, 0));
+        if (bind(listener.fd(), address, size) != 0 || ::listen(listener.fd(), 64) != 0 ||
+            getsockname(listener.fd(), address, &size) != 0) {
+            ADD_FAILURE() << "no server at " << options.address << ": " << Error::posix(errno).description();
+            return;
+        }
+        port = ntohs(isV6 ? v6.sin6_port : v4.sin_port);
+    }
+
+    void run()
+    {
+        sigset_t brokenPipe; // OpenSSL writes without MSG_NOSIGNAL
+        sigemptyset(&brokenPipe);
+        sigaddset(&brokenPipe, SIGPIPE);
+        pthread_sigmask(SIG_BLOCK, &brokenPipe, nullptr);
+        while (true) {
+            std::vector<pollfd> watched{{wake.fd(), POLLIN, 0}, {listener.fd(), POLLIN, 0}};
+            for (const auto& [fd, connection] : open) watched.push_back({fd, POLLIN, 0});
+            if (poll(watched.data(), watched.size(), -1) < 0) continue;
+            if (watched[0].revents) return;
+            if (watched[1].revents) accept();
+            for (std::size_t i = 2; i < watched.size(); ++i)
+                if (watched[i].revents && !serve(open.at(watched[i].fd))) open.erase(watched[i].fd);
+        }
+    }
+
+    void accept()
+    {
+        Connection connection;
+        connection.socket = FileHandle(accept4(listener.fd(), nullptr, nullptr, SOCK_CLOEXEC));
+        {
+            std::lock_guard lock(mutex);
+            connection.number = ++connections;
+        }
+        if (tls) {
+            connection.ssl.reset(SSL_new(tls.get()));
+            SSL_set_fd(connection.ssl.get(), connection.socket.fd());
+            if (SSL_accept(connection.ssl.get()) != 1) return;
+        }
+        const int fd = connection.socket.fd();
+        open.emplace(fd, std::move(connection));
+    }
+
+    /// Reads what is there and answers whole requests; false ends the connection.
+    bool serve(Connection& connection)
+    {
+        do {
+            std::array<char, 16 * 1024> chunk;
+            const int count = connection.ssl
+                                  ? SSL_read(connection.ssl.get(), chunk.data(), chunk.size())
+                                  : static_cast<int>(recv(connection.socket.fd(), chunk.data(), chunk.size(), 0));
+            if (count <= 0) return false;
+            connection.received.append(chunk.data(), static_cast<std::size_t>(count));
+        } while (connection.ssl && SSL_pending(connection.ssl.get()) > 0);
+
+        Request request{.connection = connection.number,
+                        .resumed = connection.ssl && SSL_session_reused(connection.ssl.get()) == 1};
+        while (const std::size_t length = requestLength(connection.received, request)) {
+            connection.received.erase(0, length);
+            {
+                std::lock_guard lock(mutex);
+                requests.push_back(request);
+            }
+            arrived.notify_all();
+            const Answer answer = handler(request);
+            send(connection, answer.bytes);
+            if (answer.then == Then::Reset) {
+                const linger atOnce{.l_onoff = 1, .l_linger = 0};
+                setsockopt(connection.socket.fd(), SOL_SOCKET, SO_LINGER, &atOnce, sizeof atOnce);
+            }
+            if (answer.then != Then::KeepOpen) return false;
+        }
+        return true;
+    }
+
+    /// A client that went away is the client's affair.
+    static void send(Connection& connection, std::string_view bytes)
+    {
+        while (!bytes.empty()) {
+            const auto count = connection.ssl
+                                   ? SSL_write(connection.ssl.get(), bytes.data(), static_cast<int>(bytes.size()))
+                                   : ::send(connection.socket.fd(), bytes.data(), bytes.size(), MSG_NOSIGNAL);
+            if (count <= 0) return;
+            bytes.remove_prefix(static_cast<std::size_t>(count));
+        }
+    }
+};
+
+TestHttpServer::TestHttpServer(Handler handler) : TestHttpServer(std::move(handler), Options()) {}
+
+TestHttpServer::TestHttpServer(Handler handler, const Options& options) : _impl(std::make_unique<Impl>())
+{
+    _impl->handler = std::move(handler);
+    _impl->options = options;
+    if (options.tls) _impl->tls = makeTls(options.address, _impl->certificate);
+    _impl->listen();
+    _impl->thread = std::thread([impl = _impl.get()] { impl->run(); });
+}
+
+TestHttpServer::~TestHttpServer()
+{
+    eventfd_write(_impl->wake.fd(), 1);
+    _impl->thread.join();
+}
+
+Url TestHttpServer::url(std::string_view target) const
+{
+    const bool isV6 = _impl->options.address.contains(':');
+    return *Url::parse(fmt::format("{}://{}:{}{}", _impl->tls ? "https" : "http",
+                                   isV6 ? "[" + _impl->options.address + "]" : _impl->options.address, _impl->port,
+                                   target));
+}
+
+std::uint16_t TestHttpServer::port() const
+{
+    return _impl->port;
+}
+
+const std::string& TestHttpServer::certificate() const
+{
+    return _impl->certificate;
+}
+
+int TestHttpServer::connections() const
+{
+    std::lock_guard lock(_impl->mutex);
+    return _impl->connections;
+}
+
+std::vector<TestHttpServer::Request> TestHttpServer::requests() const
+{
+    std::lock_guard lock(_impl->mutex);
+    return _impl->requests;
+}
+
+void TestHttpServer::waitForRequests(std::size_t count)
+{
+    std::unique_lock lock(_impl->mutex);
+    _impl->arrived.wait(lock, [&] { return _impl->requests.size() >= count; });
+}
+
+std::string httpAnswer(int status, std::string_view body, std::string_view fields)
+{
+    return fmt::format("HTTP/1.1 {} Reason\r\n{}Content-Length: {}\r\n\r\n{}", status, fields, body.size(), body);
+}
+
+TestHttpServer::Handler byPath(std::map<std::string, TestHttpServer::Answer> answers)
+{
+    return [answers = std::move(answers)](const TestHttpServer::Request& request) {
+        const auto found = answers.find(request.target);
+        return found == answers.end() ? TestHttpServer::Answer{httpAnswer(404, "no such path")} : found->second;
+    };
+}
+
+TestHttpServer::Handler always(TestHttpServer::Answer answer)
+{
+    return [answer = std::move(answer)](const TestHttpServer::Request&) { return answer; };
+}
+
+} // namespace platform::test
