@@ -4,22 +4,11 @@
 #include <array>
 #include <string>
 
+#include "platform/Text.h"
+
 namespace tavrin {
-namespace {
 
-char lower(char c)
-{
-    return c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c;
-}
-
-std::string lowerCased(std::string_view text)
-{
-    std::string result(text);
-    std::ranges::transform(result, result.begin(), lower);
-    return result;
-}
-
-} // namespace
+using platform::lowerCased;
 
 FeatureType featureTypeFromString(OptionalText text)
 {
@@ -109,7 +98,7 @@ std::optional<std::string_view> extractClientNameFromString(OptionalText text)
 
 bool tavrin_caseInsensitiveContainsString(std::string_view text, std::string_view part)
 {
-    return !std::ranges::search(text, part, [](char a, char b) { return lower(a) == lower(b); }).empty() || part.empty();
+    return lowerCased(text).contains(lowerCased(part));
 }
 
 } // namespace tavrin

@@ -1,5 +1,7 @@
 #include "CoreTavrin/TAVProtocols.h"
 
+#include <algorithm>
+
 #include <fmt/format.h>
 
 #include "CoreTavrin/TAVBag.h"
@@ -22,18 +24,35 @@ namespace {
 
 constexpr std::string_view kDiagnostics = "com.quorvane.TAVDiagnosticsXPC";
 
-/// Decodes argument `index`, which is called `name` in the interface, as a record of class T. An unknown class is told
-/// apart from a broken record: it is not an error on the wire.
+/// Longest identifier and user agent of a client, in bytes: both are kept, counted by and sent along.
+constexpr std::size_t kMaximumName = 1024;
+
+/// A record that a call brought; null for the empty dictionary. An unknown class is told apart from a broken record: it
+/// is not an error on the wire.
 enum class Refusal { Malformed, UnknownClass };
 template <class T>
-std::expected<std::shared_ptr<T>, Refusal> record(const ipc::Message& message, std::size_t index, std::string_view name,
-                                                  ipc::Responder& reply)
+std::expected<std::shared_ptr<T>, Refusal> record(const Value& value, std::string_view name, ipc::Responder& reply)
 {
-    auto decoded = platform::castRecord<T>(platform::recordFromValue(message.args[index], coreRecordClasses()));
+    if (value.count() == 0) return nullptr;
+    auto decoded = platform::castRecord<T>(platform::recordFromValue(value, coreRecordClasses()));
     if (decoded) return std::move(*decoded);
     if (decoded.error().code == platform::Decoder::kUnknownClass) return std::unexpected(Refusal::UnknownClass);
     reply(std::unexpected(ipc::CallError{.message = fmt::format("{}: {}", name, decoded.error().reason())}));
     return std::unexpected(Refusal::Malformed);
+}
+
+/// As above; nothing where the call has been refused. An unknown class is as good as no configuration.
+std::optional<std::shared_ptr<TAVSessionConfiguration>> configurationIn(const Value& value, ipc::Responder& reply)
+{
+    auto configuration = record<TAVSessionConfiguration>(value, "configuration", reply);
+    if (!configuration && configuration.error() == Refusal::Malformed) return std::nullopt;
+    auto found = configuration.value_or(nullptr);
+    if (found && std::max(found->identifier.value_or("").size(), found->userAgent.value_or("").size()) > kMaximumName) {
+        reply(std::unexpected(ipc::CallError{
+            .message = fmt::format("configuration: identifier and userAgent may have {} bytes each", kMaximumName)}));
+        return std::nullopt;
+    }
+    return found;
 }
 
 ipc::Message message(std::vector<Value> args)
@@ -67,14 +86,6 @@ RequestReply requestReply(ipc::Responder responder)
         [](std::int64_t queryId, const std::shared_ptr<TAVReply>& reply, const OptionalError& error) {
             return message({queryId, reply ? platform::toValue(*reply) : Value(Dictionary()), valueFromError(error)});
         });
-}
-
-/// A caller that can make one call only, such as busctl, sends its configuration inside its request.
-void introduceAlong(TAVDaemonXPC& daemon, const Value& value)
-{
-    if (!value.asDictionary()) return;
-    auto configuration = platform::castRecord<TAVSessionConfiguration>(platform::recordFromValue(value, coreRecordClasses()));
-    daemon.configure(configuration.value_or(nullptr), Reply<std::string>([](const std::string&) {}));
 }
 
 class ClientProxy final : public TAVClientXPC {
@@ -183,9 +194,9 @@ ipc::Handler daemonHandler(std::weak_ptr<TAVDaemonXPC> object, std::weak_ptr<TAV
         if (!daemon) return reply.abandon();
 
         if (member == "Configure") {
-            auto configuration = record<TAVSessionConfiguration>(arguments, 0, "configuration", reply);
-            if (!configuration && configuration.error() == Refusal::Malformed) return;
-            daemon->configure(configuration.value_or(nullptr),
+            auto configuration = configurationIn(arguments.args[0], reply);
+            if (!configuration) return;
+            daemon->configure(std::move(*configuration),
                               replyThrough<std::string>(std::move(reply), [](std::string endpoint) {
                                   return message({std::move(endpoint)});
                               }));
@@ -195,16 +206,20 @@ ipc::Handler daemonHandler(std::weak_ptr<TAVDaemonXPC> object, std::weak_ptr<TAV
                     return message({bagValue(bag), valueFromError(error)});
                 }));
         } else if (member == "Request") {
-            auto request = record<TAVRequest>(arguments, 0, "request", reply);
-            if (request) {
-                introduceAlong(*daemon, arguments.args[0]["configuration"]);
-                return daemon->request(std::move(*request), requestReply(std::move(reply)));
+            auto request = record<TAVRequest>(arguments.args[0], "request", reply);
+            if (!request && request.error() == Refusal::Malformed) return;
+            if (!request.value_or(nullptr)) return reply.abandon();
+            // A caller that can make one call only, such as busctl, introduces itself inside its request.
+            if (const Value& introduction = arguments.args[0]["configuration"]; introduction.asDictionary()) {
+                auto configuration = configurationIn(introduction, reply);
+                if (!configuration) return;
+                daemon->configure(std::move(*configuration), Reply<std::string>([](const std::string&) {}));
             }
-            if (request.error() == Refusal::UnknownClass) reply.abandon();
+            daemon->request(std::move(*request), requestReply(std::move(reply)));
         } else if (member == "ReportEvent") {
-            auto feedback = record<ZRFeedback>(arguments, 2, "feedback", reply);
+            auto feedback = record<ZRFeedback>(arguments.args[2], "feedback", reply);
             if (!feedback && feedback.error() == Refusal::Malformed) return;
-            if (feedback) daemon->reportEvent(text(arguments, 0), *arguments.args[1].asInt(), std::move(*feedback));
+            if (feedback.value_or(nullptr)) daemon->reportEvent(text(arguments, 0), *arguments.args[1].asInt(), std::move(*feedback));
             reply(message({}));
         } else if (member == "Feedback") {
             daemon->feedback(text(arguments, 0),
@@ -246,13 +261,12 @@ ipc::Handler endpointHandler(std::weak_ptr<TAVEndpointXPC> object)
         if (!endpoint) return reply.abandon();
 
         if (member == "Request") {
-            auto configuration = record<TAVSessionConfiguration>(arguments, 1, "configuration", reply);
-            if (!configuration && configuration.error() == Refusal::Malformed) return;
-            auto request = record<TAVRequest>(arguments, 0, "request", reply);
-            if (request)
-                return endpoint->request(std::move(*request), configuration.value_or(nullptr),
-                                         requestReply(std::move(reply)));
-            if (request.error() == Refusal::UnknownClass) reply.abandon();
+            auto configuration = configurationIn(arguments.args[1], reply);
+            if (!configuration) return;
+            auto request = record<TAVRequest>(arguments.args[0], "request", reply);
+            if (!request && request.error() == Refusal::Malformed) return;
+            if (!request.value_or(nullptr)) return reply.abandon();
+            endpoint->request(std::move(*request), std::move(*configuration), requestReply(std::move(reply)));
         } else if (member == "LoadImages") {
             endpoint->loadImages(*arguments.args[0].asArray(), arguments.args[1].asUInt().value_or(0),
                                  replyThrough<Value>(std::move(reply), [](Value images) {

@@ -54,6 +54,10 @@ public:
     {
         _core->_invalidationHandler = std::move(handler);
     }
+    void setPushErrorHandler(std::function<void(const std::string&)> handler) override
+    {
+        _core->_pushErrorHandler = std::move(handler);
+    }
     void resume() override
     {
         onLoop([core = _core] { core->start(); });
@@ -141,20 +145,26 @@ void BusConnection::start()
 
 void BusConnection::push(std::string_view signal, const Message& arguments)
 {
-    if (_state != State::Open) return;
+    if (_state != State::Open) return pushFailed("the connection has ended");
     auto member = std::ranges::find(_interface->signals, signal, &Member::name);
-    if (member == _interface->signals.end()) return kLog.fault("{} has no signal {}", _interface->listenerName, signal);
+    if (member == _interface->signals.end())
+        return pushFailed(fmt::format("{} has no signal {}", _interface->listenerName, signal));
 
     sd_bus_message* message = nullptr;
     const std::string listener(_interface->listenerName);
     const std::string name(signal);
     if (sd_bus_message_new_signal(_bus.get(), &message, kObjectPath, listener.c_str(), name.c_str()) < 0)
-        return kLog.fault("signal {} can't be made", signal);
+        return pushFailed(fmt::format("{} can't be made", signal));
     const BusMessage owned(message);
     auto size = encodeArguments(message, member->in, arguments);
-    if (!size) return kLog.fault("signal {} can't be sent: {}", signal, size.error());
+    if (!size) return pushFailed(fmt::format("{} can't be sent: {}", signal, size.error()));
     send(message, *size);
     updateWatch();
+}
+
+void BusConnection::pushFailed(const std::string& reason) const
+{
+    if (_pushErrorHandler) _pushErrorHandler(reason);
 }
 
 void BusConnection::invalidate()

@@ -74,6 +74,7 @@ private:
     // the owner's wishes, each a job on the loop
     void start();
     void push(std::string_view signal, const Message& arguments);
+    void pushFailed(const std::string& reason) const;
     void invalidate();
 
     // reading
@@ -112,6 +113,7 @@ private:
     // Set by the owner before `start`.
     std::shared_ptr<const Handler> _handler;
     std::move_only_function<void()> _invalidationHandler;
+    std::function<void(const std::string&)> _pushErrorHandler;
     std::atomic<bool> _silenced = false; // no call is to reach the handler any more
 
     State _state = State::Waiting;

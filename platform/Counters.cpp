@@ -18,7 +18,7 @@ namespace platform {
 namespace {
 
 constexpr std::chrono::seconds kBatch{60};
-constexpr std::size_t kMaximumSize = 1u << 20;
+constexpr std::size_t kMaximumSize = 4u << 20; // more than the counters below can take
 /// Keys are built from clients' names and agents: a hostile one must not fill the memory.
 constexpr std::size_t kMaximumCounters = 4096;
 constexpr std::size_t kMaximumKeyLength = 512;

@@ -3,6 +3,7 @@
 #include <array>
 #include <memory>
 #include <string>
+#include <vector>
 
 #include "platform/Files.h"
 #include "platform/Queue.h"
@@ -56,6 +57,7 @@ struct Device {
     SystemNotifier& systemNotifier;
     UrlLoader& urlLoader;
     ipc::Transport& ipc;
+    std::vector<std::string> launchEvents{}; ///< names of what the service manager started the process for
 
     [[nodiscard]] std::shared_ptr<Queue> serialQueue(std::string label, Priority priority = Priority::Default) const;
     [[nodiscard]] std::shared_ptr<Queue> concurrentQueue(std::string label, Priority priority = Priority::Default) const;

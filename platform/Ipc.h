@@ -103,6 +103,8 @@ public:
     virtual void exportObject(Handler handler) = 0;
     /// Called once, after the last call. Before `resume()`.
     virtual void setInvalidationHandler(std::move_only_function<void()> handler) = 0;
+    /// Called, on any thread, with the reason why a push could not be sent. Before `resume()`.
+    virtual void setPushErrorHandler(std::function<void(const std::string&)> handler) = 0;
     /// Starts reading.
     virtual void resume() = 0;
     /// Sends a signal of the interface's `listenerName`.

@@ -48,7 +48,11 @@ public:
         std::array<char, kMaximumPath> path;
         const ssize_t length = readlink(fmt::format("/proc/{}/exe", pid).c_str(), path.data(), path.size());
         if (length < 0) return std::unexpected(Error::posix(errno));
-        return std::string(path.data(), static_cast<std::size_t>(length));
+        std::string result(path.data(), static_cast<std::size_t>(length));
+        // Of an executable that was replaced, as an update does, the kernel says so.
+        if (constexpr std::string_view kReplaced = " (deleted)"; result.ends_with(kReplaced))
+            result.resize(result.size() - kReplaced.size());
+        return result;
     }
 };
 

@@ -7,6 +7,8 @@
 #include <cstdlib>
 #include <deque>
 #include <mutex>
+#include <ranges>
+#include <utility>
 #include <vector>
 
 #include "platform/Clock.h"
@@ -111,9 +113,9 @@ struct Queue::Core {
     std::size_t jobs = 0;      // drain jobs handed to the executor and not begun
     unsigned shared = 0;       // shared tasks running
     bool exclusive = false;    // a barrier task running
-    bool suspended = false;
+    std::vector<std::shared_ptr<Suspension>> suspensions{}; ///< in the order in which their continuations are to run
 
-    [[nodiscard]] bool mayStart(bool barrier) const { return !suspended && !exclusive && (!barrier || shared == 0); }
+    [[nodiscard]] bool mayStart(bool barrier) const { return suspensions.empty() && !exclusive && (!barrier || shared == 0); }
     [[nodiscard]] bool headMayStart() const { return !entries.empty() && mayStart(entries.front().barrier); }
 
     void begin(bool barrier)
@@ -263,13 +265,14 @@ void Queue::suspendUntil(const Event& event, Duration timeout, Task continuation
         Core& core = *over.queue->_core;
         core.clock.cancel(over.timer);
         std::lock_guard lock(core.mutex);
-        core.suspended = false;
-        core.entries.push_front({.task = std::move(over.continuation), .barrier = true});
+        if (!std::ranges::all_of(core.suspensions, [](const auto& other) { return other->over.load(); })) return;
+        for (const auto& ended : std::exchange(core.suspensions, {}) | std::views::reverse)
+            core.entries.push_front({.task = std::move(ended->continuation), .barrier = true});
         core.pump(*over.queue);
     };
     {
         std::lock_guard lock(_core->mutex);
-        _core->suspended = true;
+        _core->suspensions.push_back(suspension);
     }
     suspension->timer = _core->clock.after(timeout, [suspension] { suspension->resume(); });
     {

@@ -83,7 +83,7 @@ public:
     /// From a task of this (serial) queue: once that task has returned, holds back everything queued behind it
     /// until `event` has happened or `timeout` has passed, then runs `continuation` ahead of what was held back.
     /// The continuation may call suspendUntil again. Where the event has happened already, the continuation is
-    /// next in turn.
+    /// next in turn. A task that calls it more than once has its continuations run in that order, when all may.
     void suspendUntil(const Event& event, Duration timeout, Task continuation);
 
     /// The innermost queue whose task this thread runs; null outside any.

@@ -139,6 +139,7 @@ void RunLoop::blockSignals()
     sigaddset(&set, SIGINT);
     sigaddset(&set, SIGTERM);
     pthread_sigmask(SIG_BLOCK, &set, nullptr);
+    std::signal(SIGPIPE, SIG_IGN);
 }
 
 } // namespace platform

@@ -44,7 +44,8 @@ public:
     /// The loop underneath, for the libraries that can share it. Loop's thread.
     [[nodiscard]] sd_event* handle() const;
 
-    /// Blocks SIGINT and SIGTERM for this thread and every thread made from it. Call before the first thread.
+    /// Blocks SIGINT and SIGTERM for this thread and every thread made from it, and ignores SIGPIPE: a peer that went
+    /// is an error of the write. Call before the first thread.
     static void blockSignals();
 
 private:

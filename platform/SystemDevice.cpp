@@ -1,6 +1,9 @@
 #include "platform/SystemDevice.h"
 
+#include <cstdlib>
 #include <sys/resource.h>
+
+#include <systemd/sd-daemon.h>
 
 #include "platform/Clock.h"
 #include "platform/Counters.h"
@@ -17,6 +20,24 @@
 #include "platform/UserDefaults.h"
 
 namespace platform {
+
+namespace {
+
+/// The names of the sockets that the service manager started this process for.
+std::vector<std::string> launchEvents()
+{
+    char** names = nullptr;
+    std::vector<std::string> events;
+    const int count = sd_listen_fds_with_names(false, &names);
+    for (int i = 0; i < count; ++i) {
+        events.emplace_back(names[i]);
+        std::free(names[i]);
+    }
+    std::free(names);
+    return events;
+}
+
+} // namespace
 
 struct SystemDevice::Impl {
     Impl(RunLoop& runLoop, const std::string& name, const std::string& sharedSuite)
@@ -48,6 +69,7 @@ struct SystemDevice::Impl {
                  .urlLoader = *loader,
                  .ipc = *ipc}
     {
+        device.launchEvents = launchEvents();
         device.makeQueues();
         userDefaults.watch(runLoop);
         lookupDefaults.watch(runLoop);

@@ -1,5 +1,10 @@
 #include "platform/Text.h"
 
+#include <algorithm>
+
+#include <unicode/bytestream.h>
+#include <unicode/casemap.h>
+
 namespace platform {
 
 std::size_t utf16Length(std::string_view text)
@@ -14,6 +19,20 @@ std::size_t utf16Length(std::string_view text)
         i += valid ? length : 1;
     }
     return units;
+}
+
+std::string lowerCased(std::string_view text)
+{
+    std::string result;
+    result.reserve(text.size());
+    if (std::ranges::all_of(text, [](char c) { return static_cast<unsigned char>(c) < 0x80; })) {
+        for (const char c : text) result += c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c;
+        return result;
+    }
+    icu::StringByteSink<std::string> sink(&result);
+    UErrorCode status = U_ZERO_ERROR;
+    icu::CaseMap::utf8ToLower("", 0, icu::StringPiece(text.data(), static_cast<int32_t>(text.size())), sink, nullptr, status);
+    return result;
 }
 
 } // namespace platform

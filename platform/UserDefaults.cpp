@@ -95,7 +95,10 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
             values = merged;
             fileIsBroken = false;
         }
-        if (auto done = files->writeAtomically(path, toJson(merged, JsonStyle::Pretty) + "\n"); !done) {
+        const std::string text = toJson(merged, JsonStyle::Pretty) + "\n";
+        const auto done = text.size() <= kMaximumSize ? files->writeAtomically(path, text)
+                                                      : Result<void>(std::unexpected(Error::posix(EFBIG)));
+        if (!done) {
             std::lock_guard lock(mutex);
             dirty.merge(written);
             writeFailed(done.error());

@@ -47,14 +47,23 @@ std::uint64_t queryIdOf(const std::vector<std::shared_ptr<ZRResultSection>>& sec
     return sections.empty() ? 0 : queryIdOf(sections.front());
 }
 
+/// A request of any other class gets no reply.
+bool isServed(const TAVRequest& request)
+{
+    return dynamic_cast<const TAVSearchRequest*>(&request) || dynamic_cast<const TAVMoreResultsRequest*>(&request) ||
+           dynamic_cast<const TAVCardRequest*>(&request) || dynamic_cast<const TAVZeroKeywordRequest*>(&request) ||
+           dynamic_cast<const TAVLookupRequest*>(&request) || dynamic_cast<const TAVFlightLookupRequest*>(&request) ||
+           dynamic_cast<const TAVFlightSearchRequest*>(&request);
+}
+
 /// Wraps a reply so that its answer is also a trace point.
 RequestReply traced(RequestReply reply, TAVTraceCode answer)
 {
     auto shared = std::make_shared<RequestReply>(std::move(reply));
     return RequestReply(
         [shared, answer](std::int64_t queryId, std::shared_ptr<TAVReply> record, OptionalError error) {
-            TAVTrace(answer, static_cast<std::uint64_t>(queryId));
             (*shared)(queryId, std::move(record), std::move(error));
+            TAVTrace(answer, static_cast<std::uint64_t>(queryId));
         },
         [shared] { shared->abandon(); });
 }
@@ -84,21 +93,29 @@ ClientConnection::ClientConnection(Assembly& assembly, std::shared_ptr<TAVClient
 
 ClientConnection::~ClientConnection() = default;
 
+std::shared_ptr<ClientState> ClientConnection::_boundState() const
+{
+    std::lock_guard lock(_mutex);
+    return _state;
+}
+
 std::string ClientConnection::_userAgent() const
 {
+    std::lock_guard lock(_mutex);
     return _configuration ? _configuration->userAgent.value_or("") : "";
 }
 
 std::optional<std::string> ClientConnection::clientShortName() const
 {
-    return _state ? _state->clientShortName() : std::nullopt;
+    const auto state = _boundState();
+    return state ? state->clientShortName() : std::nullopt;
 }
 
 void ClientConnection::_ensureState()
 {
     const platform::Log& log = TavrinLogForCategory(kLogSession);
     if (!_configuration) return log.fault("configuration must not be nil");
-    if (_configuration->identifier.value_or("").empty() || _configuration->userAgent.value_or("").empty())
+    if (!_configuration->identifier || !_configuration->userAgent)
         return log.fault("configuration requires identifier and agent");
     if (_state) {
         if (_state->identifier() != *_configuration->identifier) log.fault("session identifier must match");
@@ -106,6 +123,7 @@ void ClientConnection::_ensureState()
     }
     if (auto state = _clientStateManager->stateForClientIdentifier(_configuration->identifier)) {
         state->setConfiguration(_configuration);
+        std::lock_guard lock(_mutex);
         _state = std::move(state);
     }
 }
@@ -115,7 +133,10 @@ void ClientConnection::configure(std::shared_ptr<TAVSessionConfiguration> config
 {
     TavrinLogForCategory(kLogConnection)
         .log("client configuration {}", configuration ? platform::toJson(platform::toValue(*configuration)) : "none");
-    _configuration = std::move(configuration);
+    {
+        std::lock_guard lock(_mutex);
+        _configuration = std::move(configuration);
+    }
     _ensureState();
     if (!_state) {
         ClientSessionManager::reportErrorAsTavrindFeedback(
@@ -144,17 +165,21 @@ void ClientConnection::configure(std::shared_ptr<TAVSessionConfiguration> config
                         connection->bagChangeNotification(notification.get<std::shared_ptr<const TAVBag>>("bag"));
                 });
             // One may have come in between, too late for the answer and too early for the observer.
-            if (!bag)
-                if (auto late = self->_state->bag()) self->_remoteObject->bagDidLoad(late, {});
+            const auto newest = self->_assembly.bagController->inMemoryBag();
+            if (newest && (!bag || newest->rawBag() != bag->rawBag())) self->_remoteObject->bagDidLoad(newest, {});
             self->_clientStateManager->saveState();
         }));
     reply(_clientStateManager->endpoint());
 }
 
-void ClientConnection::bagChangeNotification(const std::shared_ptr<const TAVBag>& bag)
+/// On the thread that installs the bag, which all readers of the bag wait for: the client is told from another.
+void ClientConnection::bagChangeNotification(std::shared_ptr<const TAVBag> bag)
 {
     TavrinLogForCategory(kLogBag).info("bag change notification: {}", bag ? bag->version() : "none");
-    if (bag) _remoteObject->bagDidLoad(bag, {});
+    if (!bag) return;
+    _connection->queue()->async([weak = weak_from_this(), bag = std::move(bag)] {
+        if (auto self = weak.lock()) self->_remoteObject->bagDidLoad(bag, {});
+    });
 }
 
 void ClientConnection::bag(BagReply reply)
@@ -182,6 +207,7 @@ void ClientConnection::_completeDefaults(TAVRequest& request) const
 void ClientConnection::request(std::shared_ptr<TAVRequest> request, RequestReply reply)
 {
     _ensureState();
+    if (!isServed(*request)) return reply.abandon();
     if (!_state) return reply(request->queryId, nullptr, makeTAVError(TAVErrorInvalidResponse, "client state nil"));
     _completeDefaults(*request);
 
@@ -201,10 +227,8 @@ void ClientConnection::request(std::shared_ptr<TAVRequest> request, RequestReply
         _state->lookup(std::move(lookup), traced(std::move(reply), kTraceLookupAnswer));
     } else if (dynamic_cast<TAVFlightLookupRequest*>(request.get())) {
         _state->flightLookup(std::move(request), std::move(reply));
-    } else if (dynamic_cast<TAVFlightSearchRequest*>(request.get())) {
-        _state->flightSearch(std::move(request), std::move(reply));
     } else {
-        reply.abandon();
+        _state->flightSearch(std::move(request), std::move(reply));
     }
 }
 
@@ -300,11 +324,14 @@ void ClientConnection::feedback(const std::string&, platform::Reply<platform::Va
 {
     TAVTrace(kTraceFeedbackStart, 0);
     _ensureState();
+    if (!_state) {
+        reply({}, makeTAVError(TAVErrorInvalidResponse, "client state nil"));
+    } else {
+        const auto manager = _state->sessionManager();
+        const auto session = manager ? manager->session() : nullptr;
+        reply(session ? session->feedbacksWithRelativeTimestamp() : platform::Value::Array(), {});
+    }
     TAVTrace(kTraceFeedbackAnswer, 0);
-    if (!_state) return reply({}, makeTAVError(TAVErrorInvalidResponse, "client state nil"));
-    const auto manager = _state->sessionManager();
-    const auto session = manager ? manager->session() : nullptr;
-    reply(session ? session->feedbacksWithRelativeTimestamp() : platform::Value::Array(), {});
 }
 
 void ClientConnection::listenToFlusher(platform::Reply<std::string> reply)
@@ -322,23 +349,28 @@ void ClientConnection::listSessions(platform::Reply<platform::Value::Array> repl
 void ClientConnection::fileHandleAndAttributesForResource(const std::string& resource, ResourceReply reply)
 {
     _ensureState();
-    auto found = _assembly.downloadManager->fileHandleForResource(resource);
-    if (found)
-        reply(std::move(found->file), std::move(found->attributes), {});
-    else
+    try {
+        auto found = _assembly.downloadManager->fileHandleForResource(resource);
+        if (found) return reply(std::move(found->file), std::move(found->attributes), {});
         reply({}, {}, std::move(found.error()));
+    } catch (const std::exception& exception) { // out of memory, or a fault of a library
+        TavrinLogForCategory(kLogConnection).fault("identifier: {} exception: {}", resource, exception.what());
+        if (reply) reply({}, {}, makeTAVError(TAVErrorInvalidResponse, exception.what()));
+    }
 }
 
 void ClientConnection::flushSession(std::move_only_function<void()> callback)
 {
-    const auto manager = _state ? _state->sessionManager() : nullptr;
+    const auto state = _boundState();
+    const auto manager = state ? state->sessionManager() : nullptr;
     if (!manager) return callback();
     manager->flushSession(std::move(callback));
 }
 
 void ClientConnection::flushSessionInvalidation(std::move_only_function<void(bool)> callback)
 {
-    const auto manager = _state ? _state->sessionManager() : nullptr;
+    const auto state = _boundState();
+    const auto manager = state ? state->sessionManager() : nullptr;
     if (!manager) return callback(false);
     manager->flushSessionInvalidation(_userAgent(), std::move(callback));
 }

@@ -3,6 +3,7 @@
 #include <atomic>
 #include <functional>
 #include <memory>
+#include <mutex>
 #include <optional>
 #include <string>
 
@@ -24,8 +25,8 @@ class TavrinFlusherXPC;
 /// What one client connection talks to.
 ///
 /// It is bound to the state of its client by the first valid configuration, and to no other after that. Calls arrive on
-/// the connection's queue, as do `flushSession` and `flushSessionInvalidation`; answers to searches come from any
-/// thread, and only the highest query id is written there.
+/// the connection's queue; the public rest is for any thread. Answers to searches come from any thread, and only the
+/// highest query id is written there.
 class ClientConnection : public TAVDaemonXPC, public std::enable_shared_from_this<ClientConnection> {
 public:
     /// `remoteObject` is the client's side of `connection`.
@@ -54,6 +55,7 @@ public:
 
 private:
     void _ensureState();
+    [[nodiscard]] std::shared_ptr<ClientState> _boundState() const;
     [[nodiscard]] std::string _userAgent() const;
     void _completeDefaults(TAVRequest& request) const;
     void search(std::shared_ptr<TAVSearchRequest> request, RequestReply reply);
@@ -61,13 +63,14 @@ private:
     void handleCustomFeedback(std::shared_ptr<ZRCustomFeedback> feedback, std::int64_t queryId,
                               std::move_only_function<void()> callback);
     void _reportOneOff(const platform::Error& error) const;
-    void bagChangeNotification(const std::shared_ptr<const TAVBag>& bag);
+    void bagChangeNotification(std::shared_ptr<const TAVBag> bag);
 
     Assembly& _assembly;
     std::shared_ptr<ClientStateManager> _clientStateManager;
     std::shared_ptr<TAVClientXPC> _remoteObject;
     std::shared_ptr<platform::ipc::Connection> _connection;
     std::shared_ptr<TavrinFlusherXPC> _flusherListener;
+    mutable std::mutex _mutex; // for the two below, which are written on the connection's queue and read anywhere
     std::shared_ptr<TAVSessionConfiguration> _configuration;
     std::shared_ptr<ClientState> _state;
     std::atomic<std::int64_t> _currentQueryId = 0;

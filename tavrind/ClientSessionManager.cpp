@@ -1,6 +1,8 @@
 #include "tavrind/ClientSessionManager.h"
 
 #include "CoreTavrin/TAVSessionConfiguration.h"
+#include "platform/Clock.h"
+#include "platform/Device.h"
 #include "searchrecords/ZRErrorFeedback.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/TavrinFeedback.h"
@@ -43,7 +45,9 @@ std::shared_ptr<TavrinFeedback> ClientSessionManager::errorFeedback(const platfo
 {
     std::string guid;
     if (assembly.guidController) guid = assembly.guidController->currentUserGUID().string();
-    return std::make_shared<TavrinFeedback>(std::make_shared<ZRErrorFeedback>(error), 0, guid, tavrindUserAgent());
+    auto record = std::make_shared<ZRErrorFeedback>(error);
+    record->timestamp = assembly.device.clock.hostTicks();
+    return std::make_shared<TavrinFeedback>(std::move(record), 0, guid, tavrindUserAgent());
 }
 
 void ClientSessionManager::reportErrorAsTavrindFeedback(const platform::Error& error, Assembly& assembly)

@@ -128,7 +128,10 @@ void ClientState::_ensureBag(std::move_only_function<void(bool)> then)
     });
     if (state != State::Missing) return then(state == State::Held);
 
-    if (const auto current = _assembly.bagController->currentBag()) return then(_storeBagFrom(*current));
+    if (const auto current = _assembly.bagController->currentBag()) {
+        _storeBagFrom(*current);
+        return then(true);
+    }
 
     _markNetworkRequest();
     platform::Queue::current()->suspendUntil(
@@ -136,10 +139,12 @@ void ClientState::_ensureBag(std::move_only_function<void(bool)> then)
         [self = shared_from_this(), then = std::move(then)]() mutable { then(self->bag() != nullptr); });
 }
 
-bool ClientState::_storeBagFrom(const TAVBag& bag)
+/// Unless a newer one has been announced since it was read.
+void ClientState::_storeBagFrom(const TAVBag& bag)
 {
-    _queue->sync([&] { _bag = std::make_shared<const TAVBag>(bag.rawBag(), *_userAgent); });
-    return true;
+    _queue->sync([&] {
+        if (!_bag) _bag = std::make_shared<const TAVBag>(bag.rawBag(), *_userAgent);
+    });
 }
 
 void ClientState::bagChangeNotification(const std::shared_ptr<const TAVBag>& bag)
@@ -160,9 +165,10 @@ void ClientState::warm()
 
     const platform::UrlRequest request = _assembly.requestFactory->warmRequest(*url);
     if (const auto& manager = _assembly.clientSessionManager) {
-        manager->addTavrinFeedback(std::make_shared<TavrinFeedback>(
-            startNetworkSearchFeedback("", request, StartSearchTrigger::Warm, EndpointType::TavrinWarm), 0, "",
-            ClientSessionManager::tavrindUserAgent()));
+        auto start = startNetworkSearchFeedback("", request, StartSearchTrigger::Warm, EndpointType::TavrinWarm);
+        start->timestamp = _assembly.device.clock.hostTicks();
+        manager->addTavrinFeedback(
+            std::make_shared<TavrinFeedback>(std::move(start), 0, "", ClientSessionManager::tavrindUserAgent()));
     }
     _assembly.urlSession
         ->dataTask(request,
@@ -180,6 +186,13 @@ void ClientState::_markNetworkRequest()
     _queue->async([self = shared_from_this(), now] { self->_lastNetworkRequest = now; });
 }
 
+/// Reading it may roll it, which empties query caches: only a request that is about to be made reads it.
+platform::Uuid ClientState::_currentUserGUID() const
+{
+    const auto controller = guidController();
+    return controller ? controller->currentUserGUID() : platform::Uuid();
+}
+
 void ClientState::_setPerformedSearch()
 {
     _assembly.requestFactory->setPerformedSearch();
@@ -189,7 +202,7 @@ std::optional<platform::Duration> ClientState::_requestTimeout() const
 {
     const double seconds =
         _queue->sync([this] { return _configuration ? _configuration->timeoutIntervalForRequest : 0; });
-    return seconds > 0 ? std::optional(platform::durationFromSeconds(seconds)) : std::nullopt;
+    return seconds > 0 ? std::optional(requestTimeout(seconds)) : std::nullopt;
 }
 
 } // namespace tavrin

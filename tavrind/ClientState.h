@@ -10,6 +10,7 @@
 #include "platform/NotificationCenter.h"
 #include "platform/Queue.h"
 #include "platform/UrlSession.h"
+#include "platform/Uuid.h"
 
 namespace tavrin {
 
@@ -68,7 +69,7 @@ private:
 
     // The bag.
     void _ensureBag(std::move_only_function<void(bool)> then);
-    [[nodiscard]] bool _storeBagFrom(const TAVBag& bag);
+    void _storeBagFrom(const TAVBag& bag);
     void bagChangeNotification(const std::shared_ptr<const TAVBag>& bag);
 
     // The road of a request, step by step (ClientStateRequests.cpp).
@@ -91,6 +92,7 @@ private:
                             std::size_t responseSize, int statusCode, const platform::Value& timingData);
     void endNetworkFeedback(const Exchange& exchange, const platform::Value& rawResponse, std::size_t responseSize,
                             int statusCode, const platform::Value& timingData);
+    [[nodiscard]] platform::Uuid _currentUserGUID() const;
     void _setPerformedSearch();
     void _markNetworkRequest();
     [[nodiscard]] std::optional<platform::Duration> _requestTimeout() const;

@@ -105,14 +105,15 @@ void ClientStateManager::_accept(std::shared_ptr<platform::ipc::Connection> conn
     const platform::Log& log = TavrinLogForCategory(kLogConnection);
     log.debug("new endpoint connection");
     connection->exportObject(endpointHandler(weak_from_this()));
-    connection->setInvalidationHandler([&log] { log.debug("endpoint connection invalidated"); });
+    // The handler keeps the connection until it ends.
+    connection->setInvalidationHandler([connection, &log] { log.debug("endpoint connection invalidated"); });
     connection->resume();
 }
 
 void ClientStateManager::request(std::shared_ptr<TAVRequest> request,
                                  std::shared_ptr<TAVSessionConfiguration> configuration, RequestReply reply)
 {
-    const auto state = configuration ? stateForClientIdentifier(configuration->identifier) : nullptr;
+    const auto state = stateForClientIdentifier(configuration ? configuration->identifier : std::nullopt);
     if (!state) {
         const std::string description = configuration ? platform::toJson(platform::toValue(*configuration)) : "none";
         return reply(request->queryId, nullptr,

@@ -83,7 +83,6 @@ struct ClientState::Exchange {
 
     std::shared_ptr<const TAVBag> bag;
     std::optional<std::string> userAgent;
-    platform::Uuid userGuid;
     std::uint64_t fieldMask = 0;
     EndpointType endpoint = EndpointType::TavrinSearch;
     bool isSearch = false;
@@ -123,7 +122,6 @@ void ClientState::_withBag(ExchangePtr exchange, std::move_only_function<void()>
         }
         if (tavrin_caseInsensitiveContainsString(*exchange->userAgent, "messages"))
             exchange->fieldMask = kFieldMaskNoLocation;
-        if (const auto controller = self->guidController()) exchange->userGuid = controller->currentUserGUID();
         then();
     });
 }
@@ -153,7 +151,7 @@ void ClientState::search(std::shared_ptr<TAVSearchRequest> request, RequestReply
 
         log.log("Dispatching network request for (id, query): ({}, {})", query.queryId, query.queryString);
         self->_send(exchange,
-                    self->_assembly.requestFactory->searchRequest(query, *exchange->bag, exchange->userGuid,
+                    self->_assembly.requestFactory->searchRequest(query, *exchange->bag, self->_currentUserGUID(),
                                                                   exchange->fieldMask, self->_requestTimeout()),
                     query.queryString);
     });
@@ -172,7 +170,7 @@ void ClientState::zeroKeyword(std::shared_ptr<TAVZeroKeywordRequest> request, Re
         log.log("Dispatching network request for zkw query");
         self->_send(exchange,
                     self->_assembly.requestFactory->zeroKeywordRequest(*exchange->request, *exchange->bag,
-                                                                       exchange->userGuid, exchange->fieldMask,
+                                                                       self->_currentUserGUID(), exchange->fieldMask,
                                                                        self->_requestTimeout()),
                     exchange->request->queryString);
     });
@@ -185,10 +183,9 @@ void ClientState::moreResults(std::shared_ptr<TAVMoreResultsRequest> request, Re
     std::tie(exchange->bag, exchange->userAgent) = _queue->sync([this] { return std::pair(_bag, _userAgent); });
     if (exchange->userAgent && tavrin_caseInsensitiveContainsString(*exchange->userAgent, "messages"))
         exchange->fieldMask = kFieldMaskNoLocation;
-    if (const auto controller = guidController()) exchange->userGuid = controller->currentUserGUID();
     exchange->retryable = true;
     _send(exchange,
-          _assembly.requestFactory->moreResultsRequest(*request, exchange->bag.get(), exchange->userGuid,
+          _assembly.requestFactory->moreResultsRequest(*request, exchange->bag.get(), _currentUserGUID(),
                                                        exchange->fieldMask, _requestTimeout()),
           request->moreResultsURL ? request->moreResultsURL->queryValue("q").value_or("") : "");
 }
@@ -205,7 +202,7 @@ void ClientState::card(std::shared_ptr<TAVCardRequest> request, RequestReply rep
             return exchange->answer(nullptr, {});
         }
         self->_send(exchange,
-                    self->_assembly.requestFactory->cardRequest(*request, *exchange->bag, exchange->userGuid,
+                    self->_assembly.requestFactory->cardRequest(*request, *exchange->bag, self->_currentUserGUID(),
                                                                 self->_requestTimeout()),
                     request->queryString);
     });
@@ -221,7 +218,7 @@ void ClientState::lookup(std::shared_ptr<TAVLookupRequest> request, RequestReply
             exchange->answer(nullptr, {});
             return self->_skipSearch(*exchange, kBagDisabled);
         }
-        auto httpRequest = self->_assembly.requestFactory->lookupRequest(*request, *exchange->bag, exchange->userGuid,
+        auto httpRequest = self->_assembly.requestFactory->lookupRequest(*request, *exchange->bag, self->_currentUserGUID(),
                                                                          self->_requestTimeout());
         exchange->retryable = true;
         const auto timeout = httpRequest ? httpRequest->timeout : std::nullopt;
@@ -241,7 +238,7 @@ void ClientState::flightSearch(std::shared_ptr<TAVRequest> request, RequestReply
         }
         self->_send(exchange,
                     self->_assembly.requestFactory->flightRequest(*exchange->request, *exchange->bag,
-                                                                  exchange->userGuid, self->_requestTimeout()),
+                                                                  self->_currentUserGUID(), self->_requestTimeout()),
                     exchange->request->queryString);
     });
 }

@@ -1,5 +1,7 @@
 #include "tavrind/FeedbackRecords.h"
 
+#include <algorithm>
+
 #include "searchrecords/ZRNetworkFeedback.h"
 
 namespace tavrin {
@@ -18,6 +20,11 @@ platform::Value headerDictionary(const platform::HttpHeaders& headers)
     platform::Dictionary dictionary;
     for (const auto& [name, value] : headers) dictionary.set(name, value);
     return dictionary;
+}
+
+platform::Duration requestTimeout(double seconds)
+{
+    return platform::durationFromSeconds(std::min(seconds, 86400.0));
 }
 
 std::string describe(const platform::HttpHeaders& headers)

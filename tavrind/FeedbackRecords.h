@@ -19,6 +19,9 @@ startNetworkSearchFeedback(std::string input, const platform::UrlRequest& reques
 /// Header fields as a dictionary of strings; of fields of one name the last counts.
 [[nodiscard]] platform::Value headerDictionary(const platform::HttpHeaders& headers);
 
+/// The time-out of a request from what a client or the bag asked for, in seconds above 0: a day at most.
+[[nodiscard]] platform::Duration requestTimeout(double seconds);
+
 /// Header fields for a log line.
 [[nodiscard]] std::string describe(const platform::HttpHeaders& headers);
 

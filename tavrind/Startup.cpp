@@ -4,6 +4,7 @@
 
 #include "CoreTavrin/TAVProtocols.h"
 #include "platform/Device.h"
+#include "platform/Log.h"
 #include "platform/NotificationCenter.h"
 #include "platform/UrlSession.h"
 #include "platform/UserDefaults.h"
@@ -88,6 +89,10 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device)
         service->listenerShouldAcceptNewConnection(std::move(connection));
     });
     daemon->listener->resume();
+
+    const auto launchEventQueue = device.serialQueue("com.quorvane.tavrind.xpc_event");
+    for (const std::string& event : device.launchEvents)
+        launchEventQueue->async([event] { platform::defaultLog().log("launch event for {}", event); });
 
     device.globalQueue(platform::Priority::Background)->async([bagController = assembly.bagController] {
         (void)bagController->currentBag(); // only to start the first load

@@ -12,6 +12,7 @@
 #include "tavrind/AppWhitelistController.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/ClientSessionManager.h"
+#include "tavrind/FeedbackRecords.h"
 #include "tavrind/TavrinBagController.h"
 #include "tavrind/TavrinLogging.h"
 #include "tavrind/TavrinURLRequestBuilder.h"
@@ -253,7 +254,7 @@ UrlRequest TAVNetworkRequestFactory::build(Recipe& recipe)
     request.timeout = recipe.timeout;
     if (!request.timeout && recipe.bag)
         if (const auto seconds = recipe.bag->timeoutIntervalForRequest())
-            request.timeout = platform::durationFromSeconds(*seconds);
+            request.timeout = requestTimeout(*seconds);
     return request;
 }
 

@@ -99,8 +99,11 @@ std::shared_ptr<TavrinBagController> TavrinBagController::make(Assembly& assembl
         controller->cacheBagState(std::make_shared<const TAVBag>(std::move(cached), controller->_userAgent), true);
     controller->_refreshObserver = assembly.notificationCenter.observe(
         TAVBagRefreshRequired,
-        [weak = controller->weak_from_this()](const platform::Notification&) {
-            if (auto self = weak.lock()) self->_handleRefreshNotification();
+        [weak = controller->weak_from_this(), &device = assembly.device](const platform::Notification&) {
+            // Posted on the main queue, whose thread never waits.
+            device.globalQueue(platform::Priority::Default)->async([weak] {
+                if (auto self = weak.lock()) self->_handleRefreshNotification();
+            });
         },
         assembly.requestFactory.get());
     return controller;
@@ -289,6 +292,7 @@ void TavrinBagController::_fetchBagStateWithVersion(const std::string& version, 
     fetch->transaction = _assembly.device.transactions.begin("bagFetch");
     fetch->completion = std::move(completion);
     fetch->start = startNetworkSearchFeedback("", request, StartSearchTrigger::Bag, EndpointType::TavrinBag);
+    fetch->start->timestamp = _assembly.device.clock.hostTicks();
     if (_assembly.guidController) fetch->userGuid = _assembly.guidController->currentUserGUID().string();
     fetch->session = std::make_shared<ClientSession>(
         _assembly, std::make_shared<TavrinFeedback>(fetch->start, 0, fetch->userGuid, _userAgent));
@@ -311,6 +315,7 @@ void TavrinBagController::_fetchCompleted(Fetch& fetch, std::optional<platform::
                                           std::optional<platform::UrlResponse> response, std::optional<Error> error)
 {
     const auto addFeedback = [&](std::shared_ptr<ZRFeedback> record) {
+        record->timestamp = _assembly.device.clock.hostTicks();
         fetch.session->addFeedback(std::make_shared<TavrinFeedback>(std::move(record), 0, fetch.userGuid, _userAgent));
     };
     const int statusCode = response ? response->statusCode : 0;

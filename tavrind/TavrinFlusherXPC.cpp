@@ -12,7 +12,9 @@ std::shared_ptr<TavrinFlusherXPC> TavrinFlusherXPC::make(Assembly& assembly, Get
     bridge->_listener->setAcceptor(
         [weak = bridge->weak_from_this()](std::shared_ptr<platform::ipc::Connection> connection) {
             connection->exportObject(flusherHandler(weak));
-            connection->setInvalidationHandler([] { TavrinLogForCategory(kLogFlusher).log("listener invalidated"); });
+            // The handler keeps the connection until it ends.
+            connection->setInvalidationHandler(
+                [connection] { TavrinLogForCategory(kLogFlusher).log("listener invalidated"); });
             connection->resume();
         });
     bridge->_listener->resume();

@@ -65,10 +65,18 @@ std::optional<std::string> TavrinService::clientIDForConnection(platform::Proces
 
 void TavrinService::listenerShouldAcceptNewConnection(std::shared_ptr<ipc::Connection> connection)
 {
+    // The peer is looked up in its own file system, which may be slow or stuck: not on the listener's thread.
+    connection->queue()->async([self = shared_from_this(), connection] { self->_accept(connection); });
+}
+
+void TavrinService::_accept(const std::shared_ptr<ipc::Connection>& connection)
+{
     const pid_t pid = connection->peer().pid;
     const std::string clientId = clientIDForConnection(_assembly.device.processes, pid).value_or("none");
     log().log("new connection from {} ({})", clientId, pid);
 
+    connection->setPushErrorHandler(
+        [pid](const std::string& reason) { log().error("(pid:{}) remote proxy error: {}", pid, reason); });
     auto client = std::make_shared<ClientConnection>(_assembly, makeClientProxy(connection), connection);
     connection->exportObject(daemonHandler(client, weak_from_this()));
     connection->setInvalidationHandler([weak = weak_from_this(), weakClient = std::weak_ptr(client), clientId, pid] {

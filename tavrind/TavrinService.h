@@ -26,7 +26,7 @@ public:
     explicit TavrinService(Assembly& assembly);
     ~TavrinService() override;
 
-    /// Takes a new connection; always accepts. Run loop's thread.
+    /// Takes a new connection; always accepts, soon. Run loop's thread.
     void listenerShouldAcceptNewConnection(std::shared_ptr<platform::ipc::Connection> connection);
 
     /// A snapshot.
@@ -40,6 +40,7 @@ public:
     std::string statistics() override;
 
 private:
+    void _accept(const std::shared_ptr<platform::ipc::Connection>& connection);
     void _connectionInvalidated(const std::shared_ptr<ClientConnection>& connection, const std::string& clientId,
                                 pid_t pid);
 

@@ -25,7 +25,7 @@ int main(int argc, char** argv)
     auto daemon = tavrin::startUp(device.device());
     if (!daemon) {
         std::fprintf(stderr, "tavrind: %s\n", daemon.error().reason().c_str());
-        return EXIT_FAILURE;
+        _exit(EXIT_FAILURE); // a request may be under way: nothing is taken apart under it
     }
 
     // Nothing is flushed on the way out: what must survive a kill is on disk already.

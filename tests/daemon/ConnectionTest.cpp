@@ -50,17 +50,38 @@ TEST_F(ConnectionTest, ConfigureAnswersTheEndpointThenPushesTheBag)
 
 TEST_F(ConnectionTest, AnInvalidConfigurationClosesTheConnection)
 {
-    for (const auto& [identifier, agent] : {std::pair("", "A/1"), std::pair("id", ""), std::pair("", "")}) {
+    const Dictionary named{{"class", "TAVSessionConfiguration"}};
+    const struct {
+        Dictionary configuration;
+        const char* text;
+    } cases[] = {{{}, "configuration must not be nil"},
+                 {named, "configuration requires identifier and agent"},
+                 {{{"class", "TAVSessionConfiguration"}, {"identifier", "id"}}, "configuration requires identifier and agent"},
+                 {{{"class", "TAVSessionConfiguration"}, {"identifier", ""}, {"userAgent", "A/1"}},
+                  "client session identifier cannot be nil or empty"}};
+    for (const auto& [configuration, text] : cases) {
         platform::test::LogCapture log;
         auto connection = connect();
-        auto call = configure(*connection, identifier, agent);
+        auto call = connection->call("Configure", {configuration});
+        device.drain();
         EXPECT_TRUE(call->abandoned());
         EXPECT_TRUE(connection->invalidated());
-        EXPECT_TRUE(
-            log.has(platform::LogLevel::Fault, "Tavrin_Session", "configuration requires identifier and agent"));
+        EXPECT_TRUE(log.has(platform::LogLevel::Fault, "Tavrin_Session", text));
         EXPECT_TRUE(log.has(platform::LogLevel::Fault, "Tavrin_Session", "invalid configuration, closing connection"));
         EXPECT_EQ(session->takeClasses(), std::vector<std::string>{"ZRErrorFeedback"});
     }
+}
+
+TEST_F(ConnectionTest, AClientWithoutANameHasNoBag)
+{
+    auto connection = connect();
+    EXPECT_TRUE(configure(*connection, "com.quorvane.vistrel", "")->answered());
+    const auto pushes = connection->takePushes();
+    ASSERT_EQ(pushes.size(), 2u);
+    EXPECT_EQ(pushes[0].message.args[1]["userInfo"]["reason"], Value("no UserAgent"));
+
+    auto call = configure(*connect(), std::string(5000, 'x'), "A/1");
+    EXPECT_FALSE(call->take()) << "a name of any length would be kept, counted by and sent along";
 }
 
 TEST_F(ConnectionTest, ASecondIdentifierKeepsTheFirstState)
@@ -111,6 +132,18 @@ TEST_F(ConnectionTest, ACallerWithOneCallIntroducesItselfInsideItsRequest)
 
     const auto [refused, unanswered] = ask(Value::dictionaryOf({{"class", "TAVSessionConfiguration"}}));
     EXPECT_TRUE(refused->invalidated());
+}
+
+TEST_F(ConnectionTest, CallsWithoutARecordAreNotAnswered)
+{
+    for (auto connection : {connect(), client()}) {
+        auto request = connection->call("Request", {Dictionary()});
+        auto plain = connection->call("Request", {Dictionary{{"class", "TAVRequest"}}});
+        auto event = connection->call("ReportEvent", {"event", 1, Dictionary()});
+        device.drain();
+        EXPECT_TRUE(request->abandoned() && plain->abandoned() && event->answered());
+        EXPECT_FALSE(connection->invalidated());
+    }
 }
 
 TEST_F(ConnectionTest, MalformedCallsAreRefusedAndTheConnectionLivesOn)

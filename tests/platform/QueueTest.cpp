@@ -87,6 +87,25 @@ TEST_F(QueueTest, SuspensionHoldsBackWhatIsBehindIt)
     }
 }
 
+TEST_F(QueueTest, SuspensionsOfOneTaskEndTogetherAndInOrder)
+{
+    auto queue = serial();
+    Event first;
+    Event second;
+    queue->async([&] {
+        queue->suspendUntil(first, 2s, note(1));
+        queue->suspendUntil(second, 1s, note(2));
+    });
+    queue->async(note(3));
+    executor.drain();
+    second.signal();
+    executor.drain();
+    EXPECT_TRUE(order.empty()) << "the second may go on, but not ahead of the first";
+    first.signal();
+    executor.drain();
+    EXPECT_EQ(order, (std::vector{1, 2, 3}));
+}
+
 TEST_F(QueueTest, SuspensionMayFollowSuspension)
 {
     auto queue = serial();

@@ -211,6 +211,12 @@ void FakeConnection::setInvalidationHandler(std::move_only_function<void()> hand
     _invalidationHandler = std::move(handler);
 }
 
+void FakeConnection::setPushErrorHandler(std::function<void(const std::string&)> handler)
+{
+    std::lock_guard lock(_mutex);
+    _pushErrorHandler = std::move(handler);
+}
+
 void FakeConnection::resume()
 {
     std::lock_guard lock(_mutex);
@@ -225,8 +231,13 @@ void FakeConnection::push(std::string_view signal, ipc::Message arguments)
         return;
     }
     expectShape(signal, found->in, arguments);
-    std::lock_guard lock(_mutex);
-    if (_invalidated) return;
+    std::unique_lock lock(_mutex);
+    if (_invalidated) {
+        const auto handler = _pushErrorHandler;
+        lock.unlock();
+        if (handler) handler("the connection has ended");
+        return;
+    }
     _pushes.push_back({std::string(signal), std::move(arguments)});
     _pushed.notify_all();
 }
@@ -289,7 +300,8 @@ std::shared_ptr<FakeConnection> FakeTransport::connect(std::string_view interfac
     if (!acceptor) return nullptr;
     auto queue = Queue::make(endpoint->label, Queue::Kind::Serial, _executor, _clock);
     auto connection = std::make_shared<FakeConnection>(endpoint->interface, peer, std::move(queue));
-    acceptor(connection);
+    // As with the real one, letting go of what the acceptor gets ends the connection.
+    acceptor(std::shared_ptr<ipc::Connection>(connection.get(), [connection](ipc::Connection*) { connection->invalidate(); }));
     return connection;
 }
 

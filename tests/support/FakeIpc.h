@@ -71,6 +71,7 @@ public:
     [[nodiscard]] const std::shared_ptr<Queue>& queue() const override { return _queue; }
     void exportObject(ipc::Handler handler) override;
     void setInvalidationHandler(std::move_only_function<void()> handler) override;
+    void setPushErrorHandler(std::function<void(const std::string&)> handler) override;
     void resume() override;
     void push(std::string_view signal, ipc::Message arguments) override;
     void invalidate() override;
@@ -85,6 +86,7 @@ private:
     std::condition_variable _pushed;
     std::shared_ptr<ipc::Handler> _handler;
     std::move_only_function<void()> _invalidationHandler;
+    std::function<void(const std::string&)> _pushErrorHandler;
     std::vector<FakePush> _pushes;
     const std::shared_ptr<std::atomic<bool>> _dropCalls = std::make_shared<std::atomic<bool>>(false);
     bool _resumed = false;
