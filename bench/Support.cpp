@@ -6,6 +6,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <fcntl.h>
 #include <filesystem>
 #include <fstream>
 #include <poll.h>
@@ -103,6 +104,7 @@ Process::Process(const std::vector<std::string>& command, const std::vector<std:
         for (const std::string& variable : variables) putenv(const_cast<char*>(variable.c_str()));
         if (listeningSocket) {
             dup2(*listeningSocket, 3);
+            fcntl(3, F_SETFD, 0); // it may have been 3 already
             static char fds[] = "LISTEN_FDS=1";
             static char pid[32];
             std::snprintf(pid, sizeof(pid), "LISTEN_PID=%d", getpid());
