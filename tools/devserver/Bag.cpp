@@ -1,0 +1,99 @@
+#include "tools/devserver/Bag.h"
+
+#include <fmt/format.h>
+
+#include "tools/devserver/Resources.h"
+
+namespace devserver {
+
+using platform::Dictionary;
+using platform::Value;
+
+namespace {
+
+constexpr std::size_t kMaximumOverrides = 256 * 1024; // bytes of JSON
+
+} // namespace
+
+Bag::Bag(std::string base) : _base(std::move(base)) {}
+
+Value Bag::document() const
+{
+    const std::lock_guard lock(_mutex);
+    Dictionary bag{
+        {"version", _version},
+        {"isEnabled", true},
+        {"feedbackEnabled", true},
+        {"minimumQueryLength", 2},
+        {"timeoutIntervalForRequest", 30},
+        {"searchURL", _base + "/search"},
+        {"warmURL", _base + "/warm"},
+        {"flightURL", _base + "/flight"},
+        {"feedbackURL", _base + "/feedback"},
+        {"crowdsourcingURL", _base + "/crowdsourcing"},
+        {"imageURL", _base + "/images/{id}"},
+        {"sendGeoEnvironmentHeader", false},
+        {"supportedGeoLocationSources", Value::Array{"gps", "wifi", "cell"}},
+        {"subscriptionProviderDomainWhitelist", Value::Array{"news.example", "films.example"}},
+        {"subscriptionProviderBundleIdentifierWhitelist", Value::Array{"com.quorvane.films"}},
+        {"subscriptionTTL", 86400},
+    };
+    for (const std::string_view name : resourceNames())
+        bag.set(std::string(name), resourceUrl(_base, name, _resourceVersion));
+    for (const auto& [key, value] : _overrides) {
+        if (value.isNull())
+            bag.remove(key);
+        else
+            bag.set(key, value);
+    }
+    return bag;
+}
+
+std::int64_t Bag::version() const
+{
+    const std::lock_guard lock(_mutex);
+    return _version;
+}
+
+std::int64_t Bag::bump()
+{
+    const std::lock_guard lock(_mutex);
+    return ++_version;
+}
+
+std::int64_t Bag::bumpResources()
+{
+    const std::lock_guard lock(_mutex);
+    return ++_resourceVersion;
+}
+
+std::expected<void, std::string> Bag::merge(const Value& keys)
+{
+    const Dictionary* entries = keys.asDictionary();
+    if (!entries) return std::unexpected("give a JSON object of bag keys; null removes a key");
+    const std::lock_guard lock(_mutex);
+    Dictionary merged = _overrides;
+    std::int64_t version = _version;
+    for (const auto& [key, value] : *entries) {
+        const auto number = key == "version" ? value.asInt() : std::nullopt;
+        if (number && *number >= 0 && *number <= INT32_MAX) {
+            version = *number;
+            merged.remove(key);
+        } else {
+            merged.set(key, value);
+        }
+    }
+    if (platform::jsonSize(merged) > kMaximumOverrides)
+        return std::unexpected(fmt::format("more than {} bytes of overrides: POST /control/reset", kMaximumOverrides));
+    _overrides = std::move(merged);
+    _version = version;
+    return {};
+}
+
+void Bag::reset()
+{
+    const std::lock_guard lock(_mutex);
+    _overrides = {};
+}
+
+} // namespace devserver

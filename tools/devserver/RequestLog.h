@@ -1,0 +1,47 @@
+#pragma once
+
+#include <cstdint>
+#include <deque>
+#include <map>
+#include <mutex>
+#include <string>
+#include <string_view>
+
+#include "platform/Value.h"
+#include "tools/devserver/Http.h"
+
+namespace devserver {
+
+/// The requests that came in, in order of arrival, and how many of each kind. Control calls are none. Any thread.
+class RequestLog {
+public:
+    static constexpr std::size_t kKept = 1000;
+
+    /// Notes a request as it arrives: before any delay, and before it is answered.
+    void add(std::string_view endpoint, const Request& request);
+    /// The last `count` requests of an endpoint ("" for all) with a number above `since`:
+    /// {"requests": [{"number", "time", "endpoint", "method", "path", "query", "headers"}], "last": N}.
+    [[nodiscard]] platform::Value list(std::string_view endpoint, std::uint64_t since, std::size_t count) const;
+    [[nodiscard]] std::uint64_t total() const;
+    /// {"search": 3, ...}: those that were asked for.
+    [[nodiscard]] platform::Value byEndpoint() const;
+    /// Forgets requests and counts; numbers go on.
+    void clear();
+
+private:
+    struct Kept {
+        std::uint64_t number;
+        std::string endpoint;
+        platform::Value value;
+    };
+    mutable std::mutex _mutex;
+    std::uint64_t _lastNumber = 0;
+    std::uint64_t _total = 0;
+    std::map<std::string, std::uint64_t, std::less<>> _counts;
+    std::deque<Kept> _kept;
+};
+
+/// The headers as a JSON object, with the values of those that carry credentials hidden.
+[[nodiscard]] platform::Value describeHeaders(const Headers& headers);
+
+} // namespace devserver

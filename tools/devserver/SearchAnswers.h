@@ -1,0 +1,54 @@
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "platform/Value.h"
+#include "tools/devserver/Catalogue.h"
+#include "tools/devserver/Matching.h"
+
+namespace devserver {
+
+/// What the service answers from its catalogue: JSON arrays of result sets, without the stamp that `stamp` adds.
+/// Immutable: any thread.
+class SearchAnswers {
+public:
+    /// `base` is the service's own address over HTTPS. The catalogue must outlive this.
+    SearchAnswers(const Catalogue& catalogue, std::string base) : _catalogue(catalogue), _base(std::move(base)) {}
+
+    /// One set for each of the best completions of the query; one empty set without "query" where nothing fits.
+    [[nodiscard]] platform::Value search(std::string_view query, bool withSuggestions = true) const;
+    /// What is popular in every section, and popular queries as suggestions.
+    [[nodiscard]] platform::Value zeroKeyword() const;
+    /// The next results of one section.
+    [[nodiscard]] platform::Value moreResults(std::string_view query, const Section& section, std::size_t offset) const;
+    /// Results with "lookup_instructions". `domain` prefers a section by its key.
+    [[nodiscard]] platform::Value lookup(std::string_view words, std::string_view domain) const;
+    /// Nothing for an unknown identifier.
+    [[nodiscard]] std::optional<platform::Value> card(std::string_view identifier) const;
+    [[nodiscard]] platform::Value flights(std::string_view query) const;
+
+private:
+    [[nodiscard]] platform::Value result(const Entry& entry, double score) const;
+    [[nodiscard]] platform::Value resultSet(std::string_view query, const std::vector<const Match*>& matches) const;
+    [[nodiscard]] std::string moreUrl(std::string_view query, const Section& section, std::size_t offset) const;
+
+    const Catalogue& _catalogue;
+    std::string _base;
+};
+
+/// What every result set of an answer carries besides.
+struct Stamp {
+    std::string fbq;             ///< opaque; comes back in feedback
+    std::string partialClientIp; ///< the client's address without its last part
+    double duration = 0;         ///< milliseconds that the answer took
+    std::uint64_t maxAge = 0;    ///< seconds that a set may be kept; 0 is left out: no limit
+};
+void stamp(platform::Value& answer, const Stamp& stamp);
+
+/// "192.0.2.7" → "192.0.2.0"; the first three groups of an IPv6 address.
+[[nodiscard]] std::string partialAddress(std::string_view address);
+
+} // namespace devserver

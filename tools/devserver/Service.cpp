@@ -1,0 +1,153 @@
+#include "tools/devserver/Service.h"
+
+#include <charconv>
+#include <chrono>
+
+#include <fmt/format.h>
+
+#include "platform/Url.h"
+#include "tools/devserver/Control.h"
+#include "tools/devserver/Images.h"
+#include "tools/devserver/Resources.h"
+
+namespace devserver {
+
+using platform::Value;
+
+namespace {
+
+constexpr std::string_view kImages = "/images/";
+constexpr std::string_view kResources = "/resources/";
+constexpr std::size_t kMaximumQueryBytes = 2000;
+
+/// Faults that hold the request back, before it is answered. False if the peer went meanwhile.
+bool holdBack(Gate& gate, const std::vector<Fault>& faults, int connection)
+{
+    for (const Fault& fault : faults) {
+        std::optional<std::chrono::milliseconds> time;
+        if (fault.kind == Fault::Kind::Delay)
+            time = std::chrono::milliseconds(fault.number);
+        else if (fault.kind != Fault::Kind::Hang)
+            continue;
+        if (gate.wait(time, connection) == Gate::Outcome::PeerGone) return false;
+    }
+    return true;
+}
+
+std::size_t offsetIn(const Request& request)
+{
+    const std::string text = request.item("offset").value_or("0");
+    std::size_t offset = 0;
+    const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), offset);
+    return error == std::errc() ? offset : 0;
+}
+
+bool isSearch(std::string_view endpoint)
+{
+    return endpoint == "search" || endpoint == "zkw" || endpoint == "more" || endpoint == "lookup" ||
+           endpoint == "card" || endpoint == "flight";
+}
+
+} // namespace
+
+std::string_view endpointOf(const Request& request)
+{
+    const std::string_view path = request.path;
+    if (path == "/search") {
+        if (request.item("qtype") == "zkw") return "zkw";
+        return request.item("ltype") ? "lookup" : "search";
+    }
+    if (path == "/bag") return "bag";
+    if (path == "/more") return "more";
+    if (path == "/card") return "card";
+    if (path == "/flight") return "flight";
+    if (path == "/warm") return "warm";
+    if (path == "/feedback" || path == "/crowdsourcing") return "upload";
+    if (path.starts_with(kImages)) return "image";
+    if (path.starts_with(kResources)) return "resource";
+    return "unknown";
+}
+
+Service::Service(const std::string& base_) : base(base_), bag(base_), _answers(catalogue, base_) {}
+
+Answer Service::answer(const Request& request)
+{
+    if (request.path == "/control" || request.path.starts_with("/control/")) return controlAnswer(*this, request);
+
+    const std::string_view endpoint = endpointOf(request);
+    log.add(endpoint, request);
+    const std::vector<Fault> wanted = faults.take(endpoint);
+    if (!holdBack(gate, wanted, request.connection)) return Answer{.status = 499, .cut = true}; // nobody reads it
+
+    Answer answer = answerEndpoint(endpoint, request);
+    for (const Fault& fault : wanted) spoil(answer, fault, request);
+    return answer;
+}
+
+Answer Service::answerEndpoint(std::string_view endpoint, const Request& request)
+{
+    if (endpoint == "unknown")
+        return errorAnswer(404,
+                           "served here: /bag, /search, /more, /card, /flight, /images/ID, /resources/NAME, /warm, "
+                           "/feedback, /crowdsourcing; and /control over HTTP");
+    const bool get = request.method == "GET" || request.method == "HEAD";
+    if (endpoint == "upload") {
+        if (request.method != "POST") return errorAnswer(405, "feedback comes by POST");
+        return uploads.receive(request);
+    }
+    if (!get) return errorAnswer(405, "only GET and HEAD here");
+    if (isSearch(endpoint)) return answerSearch(endpoint, request);
+    if (endpoint == "bag") {
+        Answer answer = jsonAnswer(bag.document());
+        answer.headers.emplace_back("Cache-Control", "max-age=300");
+        return answer;
+    }
+    if (endpoint == "image") {
+        const std::string identifier = platform::percentDecode(std::string_view(request.path).substr(kImages.size()));
+        Answer answer{.contentType = "image/png", .body = imageFor(identifier)};
+        answer.headers.emplace_back("Cache-Control", "max-age=86400");
+        return answer;
+    }
+    if (endpoint == "resource")
+        return resourceAnswer(base, std::string_view(request.path).substr(kResources.size()), request);
+    return Answer{.status = 204}; // warm
+}
+
+Answer Service::answerSearch(std::string_view endpoint, const Request& request)
+{
+    const auto begin = std::chrono::steady_clock::now();
+    const std::string query = request.item("q").value_or("");
+    if (query.size() > kMaximumQueryBytes) return errorAnswer(400, "the query is too long");
+    if (query.empty() && endpoint != "zkw" && endpoint != "card") return errorAnswer(400, "no query item \"q\"");
+
+    Value sets;
+    if (endpoint == "zkw") {
+        sets = _answers.zeroKeyword();
+    } else if (endpoint == "lookup") {
+        sets = _answers.lookup(query, request.item("ldomain").value_or(""));
+    } else if (endpoint == "flight") {
+        sets = _answers.flights(query);
+    } else if (endpoint == "card") {
+        auto card = _answers.card(request.item("id").value_or(""));
+        if (!card) return errorAnswer(404, "no result has that \"id\"");
+        sets = std::move(*card);
+    } else if (endpoint == "more") {
+        const Section* section = findSection(request.item("section").value_or(""));
+        if (!section) return errorAnswer(400, "no section of that name");
+        sets = _answers.moreResults(query, *section, offsetIn(request));
+    } else {
+        sets = _answers.search(query, request.item("qtype") != "suggested");
+    }
+
+    const std::chrono::duration<double, std::milli> duration = std::chrono::steady_clock::now() - begin;
+    stamp(sets, {.fbq = fmt::format("{:06x}", ++_searches),
+                 .partialClientIp = partialAddress(request.peer),
+                 .duration = duration.count(),
+                 .maxAge = maxAge});
+    Answer answer = jsonAnswer(sets);
+    answer.headers = {{"Cache-Control", "no-store"},
+                      {"X-Quorvane-ForceFetch", fmt::format("{{\"bag\": {}}}", bag.version())}};
+    return answer;
+}
+
+} // namespace devserver

@@ -1,0 +1,53 @@
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <string>
+#include <string_view>
+
+#include "tools/devserver/Bag.h"
+#include "tools/devserver/Catalogue.h"
+#include "tools/devserver/Faults.h"
+#include "tools/devserver/Gate.h"
+#include "tools/devserver/Http.h"
+#include "tools/devserver/RequestLog.h"
+#include "tools/devserver/SearchAnswers.h"
+#include "tools/devserver/Uploads.h"
+
+namespace devserver {
+
+/// The search service: one call for each request, on any thread. Knows nothing of sockets.
+class Service {
+public:
+    /// `base` is the service's own address over HTTPS, "https://127.0.0.1:8443".
+    explicit Service(const std::string& base);
+
+    /// Answers a request. Takes as long as the faults that were asked for say.
+    [[nodiscard]] Answer answer(const Request& request);
+    /// Ends all waiting, now and later.
+    void stop() { gate.close(); }
+
+    static constexpr std::uint64_t kDefaultMaxAge = 60;
+
+    // What control reads and changes.
+    const std::string base;
+    const Catalogue catalogue;
+    Bag bag;
+    Faults faults;
+    RequestLog log;
+    Uploads uploads;
+    Gate gate;
+    std::atomic<std::uint64_t> maxAge = kDefaultMaxAge; ///< seconds; "max_age" of result sets
+
+private:
+    [[nodiscard]] Answer answerEndpoint(std::string_view endpoint, const Request& request);
+    [[nodiscard]] Answer answerSearch(std::string_view endpoint, const Request& request);
+
+    SearchAnswers _answers;
+    std::atomic<std::uint64_t> _searches = 0;
+};
+
+/// The endpoint's name for faults, log and counters; "unknown" for anything that isn't served.
+[[nodiscard]] std::string_view endpointOf(const Request& request);
+
+} // namespace devserver

@@ -1,0 +1,116 @@
+#include <chrono>
+#include <csignal>
+#include <cstdio>
+#include <exception>
+#include <expected>
+
+#include <fmt/format.h>
+
+#include "platform/Error.h"
+#include "platform/Files.h"
+#include "platform/Value.h"
+#include "tools/devserver/Certificate.h"
+#include "tools/devserver/HttpServer.h"
+#include "tools/devserver/Options.h"
+#include "tools/devserver/Service.h"
+
+namespace {
+
+using namespace devserver;
+
+/// The host of URLs for clients of this machine.
+std::string hostFor(const std::string& address)
+{
+    if (address == "0.0.0.0") return "127.0.0.1";
+    if (address == "::") return "[::1]";
+    return address.find(':') == address.npos ? address : "[" + address + "]";
+}
+
+std::string bindFailure(const std::string& address, int port, const std::string& reason, std::string_view option)
+{
+    if (reason == "taken")
+        return fmt::format("port {} is taken: give another with {}, or 0 for any free one", port, option);
+    return fmt::format("can't listen on {}, port {}: {}; see --address and {}", address, port, reason, option);
+}
+
+void printRequest(const Request& request, const Answer& answer, std::chrono::steady_clock::time_point begin)
+{
+    const std::chrono::duration<double, std::milli> taken = std::chrono::steady_clock::now() - begin;
+    fmt::print(stderr, "{} {}{}{} {} {} bytes {:.1f} ms\n", request.method, request.path,
+               request.query.empty() ? "" : "?", request.query, answer.status, answer.body.size(), taken.count());
+}
+
+std::expected<void, std::string> run(const Options& options, const sigset_t& signals)
+{
+    const auto certificate =
+        provideCertificate(options.certificateDirectory, options.address, std::chrono::system_clock::now());
+    if (!certificate) return std::unexpected(certificate.error());
+
+    HttpServer http;
+    HttpServer https(*certificate);
+    const auto httpPort = http.bind(options.address, options.httpPort);
+    if (!httpPort)
+        return std::unexpected(bindFailure(options.address, options.httpPort, httpPort.error(), "--http-port"));
+    const auto httpsPort = https.bind(options.address, options.httpsPort);
+    if (!httpsPort)
+        return std::unexpected(bindFailure(options.address, options.httpsPort, httpsPort.error(), "--https-port"));
+
+    const std::string host = hostFor(options.address);
+    const std::string base = fmt::format("https://{}:{}", host, *httpsPort);
+    Service service(base);
+    const auto handler = [&](const Request& request) {
+        const auto begin = std::chrono::steady_clock::now();
+        Answer answer = service.answer(request);
+        if (options.verbose) printRequest(request, answer, begin);
+        return answer;
+    };
+    http.start(handler);
+    https.start(handler);
+
+    const std::string ready =
+        platform::toJson(platform::Value::dictionaryOf({{"http", fmt::format("http://{}:{}", host, *httpPort)},
+                                                        {"https", base},
+                                                        {"ca", certificate->certificate.string()}})) +
+        "\n";
+    std::expected<void, std::string> result;
+    if (!options.readyFile.empty())
+        if (const auto written = platform::makeSystemFiles()->writeAtomically(options.readyFile, ready); !written)
+            result = std::unexpected(
+                fmt::format("can't write {}: {}", options.readyFile.string(), written.error().reason()));
+    if (result) {
+        std::fputs(ready.c_str(), stdout);
+        std::fflush(stdout);
+        if (!options.quiet)
+            fmt::print(stderr,
+                       "tavrin-devserver: {} entries; the bag is at {}/bag\n"
+                       "  SSL_CERT_FILE={} makes clients trust it; docs/devserver.md tells the rest\n",
+                       service.catalogue.entries().size(), base, certificate->certificate.string());
+        int signal = 0;
+        sigwait(&signals, &signal);
+    }
+    service.stop();
+    http.stop();
+    https.stop();
+    return result;
+}
+
+} // namespace
+
+int main(int argc, char** argv)
+{
+    const Options options = parseOptions(argc, argv);
+    // Blocked before the first thread, so that only this one takes them.
+    sigset_t signals;
+    sigemptyset(&signals);
+    sigaddset(&signals, SIGINT);
+    sigaddset(&signals, SIGTERM);
+    pthread_sigmask(SIG_BLOCK, &signals, nullptr);
+    try {
+        const auto result = run(options, signals);
+        if (result) return 0;
+        fmt::print(stderr, "tavrin-devserver: {}\n", result.error());
+    } catch (const std::exception& error) {
+        fmt::print(stderr, "tavrin-devserver: {}\n", error.what());
+    }
+    return 1;
+}
