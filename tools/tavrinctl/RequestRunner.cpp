@@ -103,7 +103,7 @@ void finish(const Options& options, const Exchange& exchange)
         printJson(describe(exchange));
     } else {
         printLine(summary(exchange));
-        printAnswer(exchange);
+        printAnswer(exchange, options.limit);
     }
     if (exchange.outcome() == Outcome::Failed) throw Failure("", 1); // said already
 }

@@ -1,6 +1,8 @@
 #include "tools/tavrinctl/Results.h"
 
+#include <algorithm>
 #include <cmath>
+#include <span>
 
 #include <fmt/format.h>
 
@@ -178,17 +180,20 @@ std::string summary(const Exchange& exchange)
     return fmt::format("{:<16} {:>7.1f} ms  {}", "\"" + printable(exchange.query) + "\"", exchange.latency, what);
 }
 
-void printAnswer(const Exchange& exchange)
+void printAnswer(const Exchange& exchange, std::size_t limit)
 {
     if (exchange.outcome() != Outcome::Answered) return;
     printHttp(*exchange.answer->reply);
     const Value raw = rawResponse(exchange);
     std::string section;
-    for (const ListedResult& result : resultsIn(raw)) {
+    const std::vector<ListedResult> results = resultsIn(raw);
+    if (limit == 0) limit = results.size();
+    for (const ListedResult& result : std::span(results).first(std::min(limit, results.size()))) {
         if (result.section != section) printLine(bold("  " + printable(section = result.section)));
         printLine(fmt::format("    {}", printable(result.title)));
         if (!result.url.empty()) printLine(dim("      " + printable(result.url)));
     }
+    if (results.size() > limit) printLine(dim(fmt::format("    … and {} more", results.size() - limit)));
     std::string suggestions;
     for (const std::string& suggestion : suggestionsIn(raw))
         suggestions += (suggestions.empty() ? "" : " · ") + printable(suggestion);

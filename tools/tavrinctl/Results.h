@@ -51,7 +51,8 @@ struct ListedResult {
 [[nodiscard]] platform::Value describe(const Exchange& exchange);
 /// One line: what was asked, what became of it, how long it took.
 [[nodiscard]] std::string summary(const Exchange& exchange);
-/// Results by section, suggestions, and the HTTP request and response of a verbose reply.
-void printAnswer(const Exchange& exchange);
+/// Results by section, suggestions, and the HTTP request and response of a verbose reply. At most `limit` results; 0 is
+/// all.
+void printAnswer(const Exchange& exchange, std::size_t limit);
 
 } // namespace tavrin::ctl

@@ -62,7 +62,7 @@ void search(const Options& options, const SearchOptions& searchOptions)
         for (const auto& key : keys) described.push_back(describe(*key));
         printJson(Value::dictionaryOf({{"keys", std::move(described)}}));
     } else if (!keys.empty()) {
-        printAnswer(*keys.back());
+        printAnswer(*keys.back(), options.limit);
     }
     if (!keys.empty() && keys.back()->outcome() == Outcome::Failed) throw Failure("the last key's search failed");
 }

@@ -24,7 +24,8 @@ struct Options {
     std::string address = TAVClient::defaultAddress();
     std::string identifier = "com.quorvane.tavrinctl";
     std::string agent = "tavrinctl/1";
-    double timeout = 30; ///< seconds
+    double timeout = 30;    ///< seconds
+    std::size_t limit = 10; ///< results of an answer that are listed; 0 is all
 };
 
 /// A connection to the daemon, or a `Failure`.

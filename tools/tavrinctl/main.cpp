@@ -25,6 +25,7 @@ int main(int argc, char** argv)
     app.add_option("--timeout", options.timeout, "Seconds to wait for an answer")
         ->check(CLI::Range(0.001, 86400.0))
         ->capture_default_str();
+    app.add_option("-n,--limit", options.limit, "Results to list; 0 is all")->capture_default_str();
     addSearchCommand(app, chosen);
     addOtherRequestCommands(app, chosen);
     addInspectCommands(app, chosen);
