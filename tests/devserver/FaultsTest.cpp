@@ -73,6 +73,8 @@ TEST(Faults, SpoilsAnswers)
 {
     EXPECT_EQ(spoilt("status:503", "[]").status, 503);
     EXPECT_EQ(spoilt("status:206", "[1]").body, "[1]");
+    EXPECT_EQ(spoilt("status:204", "[1]").body, "");
+    EXPECT_EQ(spoilt("status:304", "[1]").body, "");
     EXPECT_TRUE(spoilt("cut", "[]").cut);
     EXPECT_FALSE(platform::parseJson(spoilt("notjson", "[]").body));
     EXPECT_EQ(spoilt("wrongtype", R"({"a":1})").body, R"([{"a":1}])");

@@ -126,9 +126,8 @@ void spoil(Answer& answer, const Fault& fault, const Request& request)
     case Kind::Delay:
     case Kind::Hang: return;
     case Kind::Status:
-        if (fault.number >= 300) {
-            answer = errorAnswer(0, fmt::format("status {} on demand", fault.number));
-        }
+        if (fault.number >= 300) answer = errorAnswer(0, fmt::format("status {} on demand", fault.number));
+        if (fault.number == 204 || fault.number == 304) answer.body.clear(); // HTTP allows them none
         answer.status = static_cast<int>(fault.number);
         return;
     case Kind::Cut: answer.cut = true; return;

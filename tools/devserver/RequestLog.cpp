@@ -11,9 +11,11 @@ using platform::Value;
 
 Value describeHeaders(const Headers& headers)
 {
+    constexpr std::size_t kMostHeaders = 100;
     constexpr const char* kSecret[] = {"Authorization", "Proxy-Authorization", "Cookie"};
     platform::Dictionary described;
     for (const auto& [name, value] : headers) {
+        if (described.size() == kMostHeaders) break;
         const bool secret =
             std::ranges::any_of(kSecret, [&](const char* s) { return strcasecmp(s, name.c_str()) == 0; });
         described.set(name, secret ? "(hidden)" : value);

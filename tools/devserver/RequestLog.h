@@ -41,7 +41,7 @@ private:
     std::deque<Kept> _kept;
 };
 
-/// The headers as a JSON object, with the values of those that carry credentials hidden.
+/// The first hundred headers as a JSON object, with the values of those that carry credentials hidden.
 [[nodiscard]] platform::Value describeHeaders(const Headers& headers);
 
 } // namespace devserver

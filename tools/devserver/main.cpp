@@ -3,6 +3,8 @@
 #include <cstdio>
 #include <exception>
 #include <expected>
+#include <filesystem>
+#include <system_error>
 
 #include <fmt/format.h>
 
@@ -45,6 +47,11 @@ std::expected<void, std::string> run(const Options& options, const sigset_t& sig
     const auto certificate =
         provideCertificate(options.certificateDirectory, options.address, std::chrono::system_clock::now());
     if (!certificate) return std::unexpected(certificate.error());
+
+    if (!options.readyFile.empty()) { // one that an earlier run left would name the wrong addresses
+        std::error_code ignored;
+        std::filesystem::remove(options.readyFile, ignored);
+    }
 
     HttpServer http;
     HttpServer https(*certificate);
