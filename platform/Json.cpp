@@ -156,14 +156,26 @@ public:
     }
 
 private:
-    template <class Number> void writeNumber(Number number)
+    template <class Number, class... Format> void writeNumber(Number number, Format... format)
     {
         std::array<char, 32> digits;
-        const auto result = std::to_chars(digits.begin(), digits.end(), number);
+        const auto result = std::to_chars(digits.begin(), digits.end(), number, format...);
         _sink.put(std::string_view(digits.begin(), result.ptr));
     }
 
-    void writeReal(double number) { std::isfinite(number) ? writeNumber(number) : _sink.put("null"); }
+    void writeReal(double number)
+    {
+        // Without an exponent these would be read as integers that are out of range, and "-0" as a plain zero.
+        constexpr double kIntegerLimit = 9223372036854775808.0;
+        if (!std::isfinite(number))
+            _sink.put("null");
+        else if (std::abs(number) >= kIntegerLimit)
+            writeNumber(number, std::chars_format::scientific);
+        else if (number == 0 && std::signbit(number))
+            _sink.put("-0.0");
+        else
+            writeNumber(number);
+    }
 
     void writeString(std::string_view text)
     {
