@@ -62,8 +62,9 @@ std::optional<Url> httpUrlIn(const Value& value)
 {
     const std::string* text = value.asString();
     auto url = text ? Url::parse(*text) : std::nullopt;
-    if (url && (url->host().empty() || !url->scheme().starts_with("http"))) return std::nullopt;
-    return url;
+    if (!url || url->host().empty()) return std::nullopt;
+    const std::string scheme = url->scheme();
+    return scheme == "http" || scheme == "https" ? url : std::nullopt;
 }
 
 std::optional<std::vector<std::string>> stringsIn(const Value& value)
