@@ -324,12 +324,14 @@ private:
 
     Node date(Date date)
     {
-        const auto sinceEpoch = date.time_since_epoch() - std::chrono::seconds(kEpoch);
-        const auto seconds = std::chrono::floor<std::chrono::seconds>(sinceEpoch);
-        const auto rest = std::chrono::duration_cast<std::chrono::microseconds>(sinceEpoch - seconds);
-        if (seconds.count() < INT32_MIN || seconds.count() > INT32_MAX) return fail("a date out of range");
-        return Node(
-            plist_new_date(static_cast<std::int32_t>(seconds.count()), static_cast<std::int32_t>(rest.count())));
+        using namespace std::chrono;
+        const auto whole = floor<seconds>(date.time_since_epoch()) - seconds(kEpoch);
+        if (whole.count() < INT32_MIN || whole.count() >= INT32_MAX) return fail("a date out of range");
+        // Rounded, for a date that was read is a double, which may lie just below the microsecond that was written.
+        const auto rounded = round<microseconds>(date.time_since_epoch()) - seconds(kEpoch);
+        const auto count = floor<seconds>(rounded);
+        return Node(plist_new_date(static_cast<std::int32_t>(count.count()),
+                                   static_cast<std::int32_t>((rounded - count).count())));
     }
 
     Node array(const Value::Array& array, std::size_t depth)
