@@ -167,6 +167,14 @@ private:
     std::optional<CallError> _error;
 };
 
+/// False for every text that a bus message can't hold, and for some that it can.
+bool isBusText(const std::string& text)
+{
+    // The UTF-8 forms of noncharacters, U+FFFF and its kind, have one of these in them.
+    return simdjson::validate_utf8(text) && text.find('\0') == std::string::npos && !text.contains("\xef\xb7") &&
+           !text.contains("\xbf\xbe") && !text.contains("\xbf\xbf");
+}
+
 /// Appends arguments one complete type at a time. False, once, is the end: `reason` says why.
 class ArgumentWriter {
 public:
@@ -241,8 +249,8 @@ private:
     bool appendText(const std::string& text)
     {
         count(kSmallestValue + text.size());
-        const bool fit = simdjson::validate_utf8(text) && text.find('\0') == std::string::npos;
-        return check(sd_bus_message_append_basic(_bus, SD_BUS_TYPE_STRING, fit ? text.c_str() : busText(text).c_str()));
+        return check(sd_bus_message_append_basic(_bus, SD_BUS_TYPE_STRING,
+                                                 isBusText(text) ? text.c_str() : busText(text).c_str()));
     }
 
     bool appendBytes(const Bytes& bytes)
@@ -343,10 +351,14 @@ std::expected<std::size_t, std::string> encodeArguments(sd_bus_message* bus, std
 std::string busText(std::string_view text)
 {
     std::string repaired;
-    auto unicode = icu::UnicodeString::fromUTF8(icu::StringPiece(text.data(), static_cast<std::int32_t>(text.size())));
-    unicode.findAndReplace(icu::UnicodeString(static_cast<UChar32>(0)),
-                           icu::UnicodeString(static_cast<UChar32>(0xFFFD)));
-    unicode.toUTF8String(repaired);
+    const auto unicode =
+        icu::UnicodeString::fromUTF8(icu::StringPiece(text.data(), static_cast<std::int32_t>(text.size())));
+    icu::UnicodeString fit;
+    for (std::int32_t i = 0; i < unicode.length(); i = unicode.moveIndex32(i, 1)) {
+        const UChar32 character = unicode.char32At(i);
+        fit.append(character == 0 || U_IS_UNICODE_NONCHAR(character) ? UChar32{0xFFFD} : character);
+    }
+    fit.toUTF8String(repaired);
     return repaired;
 }
 

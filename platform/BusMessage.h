@@ -33,12 +33,13 @@ inline constexpr std::size_t kMaximumHandles = 16;
                                                                          std::size_t maximumSize);
 
 /// Appends `message` to a new bus message by `signature` and answers its size, as `Limits` counts it. A null argument
-/// travels as its type's zero; null entries of dictionaries are left out; text that isn't UTF-8 is repaired with
-/// U+FFFD. Fails, naming the argument, where a value doesn't fit its type; the bus message is of no use then.
+/// travels as its type's zero; null entries of dictionaries are left out; texts are repaired by `busText`. Fails,
+/// naming the argument, where a value doesn't fit its type; the bus message is of no use then.
 [[nodiscard]] std::expected<std::size_t, std::string> encodeArguments(sd_bus_message* bus, std::string_view signature,
                                                                       const Message& message);
 
-/// `text`, fit for a bus message: valid UTF-8 without zero bytes.
+/// `text`, fit for a bus message: U+FFFD stands for what is no UTF-8, for U+0000, and for noncharacters, which sd-bus
+/// refuses.
 [[nodiscard]] std::string busText(std::string_view text);
 
 } // namespace platform::ipc
