@@ -122,7 +122,7 @@ std::optional<Url> Url::parse(std::string_view text)
                            std::ranges::all_of(scheme, [](unsigned char c) {
                                return (isUnreserved(c) && c != '_' && c != '~') || c == '+';
                            });
-    if (!hasScheme || !parsed(encoded)) return std::nullopt;
+    if (!hasScheme || encoded.size() > kMaximumLength || !parsed(encoded)) return std::nullopt;
     return Url(std::move(encoded));
 }
 
