@@ -1,0 +1,12 @@
+#include "fuzz/Records.h"
+
+/// An archive of any record, as a session file holds it. What decodes can be encoded again, to an equal record.
+int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
+{
+    const auto record = platform::unarchive(textOf(data, size), tavrin::tavrindRecordClasses());
+    if (record)
+        fuzz::checkRoundTrips(**record);
+    else
+        fuzz::checkRefusal(record.error());
+    return 0;
+}

@@ -1,0 +1,99 @@
+#include <algorithm>
+#include <sys/socket.h>
+
+#include <systemd/sd-bus.h>
+
+#include "fuzz/Check.h"
+#include "fuzz/Values.h"
+#include "platform/BusMessage.h"
+
+using namespace platform;
+
+namespace {
+
+/// A message to nobody; it can be filled, sealed and read.
+ipc::BusMessage newMessage()
+{
+    static sd_bus* const bus = [] {
+        int ends[2] = {};
+        sd_bus* made = nullptr;
+        check(socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0, ends) == 0);
+        check(sd_bus_new(&made) >= 0 && sd_bus_set_fd(made, ends[0], ends[0]) >= 0 && sd_bus_start(made) >= 0);
+        return made;
+    }();
+    sd_bus_message* message = nullptr;
+    check(sd_bus_message_new_method_call(bus, &message, nullptr, "/a", "a.b", "C") >= 0);
+    return ipc::BusMessage(message);
+}
+
+/// `value` as it arrives: null entries left out, dates as seconds, texts repaired.
+Value arriving(const Value& value)
+{
+    if (const auto date = value.asDate()) return secondsSince1970(*date);
+    if (const std::string* text = value.asString()) return ipc::busText(*text);
+    if (const Value::Array* array = value.asArray()) {
+        Value::Array elements;
+        for (const Value& element : *array) elements.push_back(arriving(element));
+        return elements;
+    }
+    if (const Dictionary* dictionary = value.asDictionary()) {
+        Dictionary entries;
+        for (const auto& [key, entry] : *dictionary)
+            if (!entry.isNull()) entries.set(ipc::busText(key), arriving(entry));
+        return entries;
+    }
+    return value;
+}
+
+std::size_t depthOf(const Value& value)
+{
+    std::size_t deepest = 0;
+    if (const Value::Array* array = value.asArray())
+        for (const Value& element : *array) deepest = std::max(deepest, depthOf(element) + 1);
+    if (const Dictionary* dictionary = value.asDictionary())
+        for (const auto& [key, entry] : *dictionary) deepest = std::max(deepest, depthOf(entry) + 1);
+    return deepest;
+}
+
+bool hasNullElement(const Value& value)
+{
+    const Value::Array* array = value.asArray();
+    return array && std::ranges::any_of(*array, &Value::isNull);
+}
+
+/// At least this deep a message may nest; the protocol counts variants and entries, too.
+constexpr std::size_t kSafeDepth = 20;
+
+} // namespace
+
+/// A dictionary from one end to the other, read from JSON with bytes and dates as `fuzz::enriched` has them. What is
+/// written is read as the same, at the size that was counted, and is refused one byte below.
+int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
+{
+    const auto json = parseJson(textOf(data, size));
+    if (!json || !json->asDictionary()) return 0;
+    const Value value = fuzz::enriched(*json);
+
+    const auto message = newMessage();
+    const auto written = ipc::encodeArguments(message.get(), "a{sv}", {.args = {value}, .handles = {}});
+    if (!written) {
+        check(!written.error().empty() && (fuzz::anyOf(value, hasNullElement) || depthOf(value) > kSafeDepth),
+              written.error());
+        return 0;
+    }
+    check(sd_bus_message_seal(message.get(), 1, 0) >= 0);
+    const auto read = ipc::decodeArguments(message.get(), SIZE_MAX);
+    check(read.has_value(), read ? "" : read.error().message);
+    check(read->message.args.size() == 1 && read->message.args[0] == arriving(value), toJson(value));
+
+    const auto isRepaired = [](const Value& text) {
+        return text.asString() && ipc::busText(*text.asString()) != *text.asString();
+    };
+    check(*written == read->size || fuzz::anyOf(value, isRepaired), std::to_string(*written));
+    sd_bus_message_rewind(message.get(), true);
+    check(ipc::decodeArguments(message.get(), read->size).has_value());
+    sd_bus_message_rewind(message.get(), true);
+    const auto refused = ipc::decodeArguments(message.get(), read->size - 1);
+    check(!refused && refused.error().name == SD_BUS_ERROR_LIMITS_EXCEEDED, refused ? "" : refused.error().name);
+    return 0;
+}

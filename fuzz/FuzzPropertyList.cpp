@@ -1,0 +1,60 @@
+#include <chrono>
+
+#include "fuzz/Check.h"
+#include "fuzz/Values.h"
+#include "platform/Error.h"
+
+using namespace platform;
+
+namespace {
+
+/// Equal; a number that is none equals itself.
+bool same(const Value& a, const Value& b)
+{
+    const auto isNan = [](const Value& value) {
+        return value.type() == Value::Type::Double && std::isnan(*value.asDouble());
+    };
+    return a == b || (isNan(a) && isNan(b));
+}
+
+/// Equal but for what the writer changes: unsigned numbers become reals, dates are rounded.
+bool sameOnceWritten(const Value& read, const Value& again)
+{
+    if (const auto date = read.asDate(); date && again.asDate())
+        return std::chrono::abs(*date - *again.asDate()) <= std::chrono::microseconds(1);
+    if (read.type() == Value::Type::UInt) return again == Value(*read.asDouble());
+    return same(read, again);
+}
+
+bool mayBeRefused(const Value& value)
+{
+    if (const std::string* text = value.asString()) return text->find('\0') != std::string::npos;
+    const auto date = value.asDate();
+    constexpr std::int64_t kEpoch = 978307200;
+    return date &&
+           std::abs(std::chrono::floor<std::chrono::seconds>(*date).time_since_epoch().count() - kEpoch) >= INT32_MAX;
+}
+
+} // namespace
+
+/// What is read can be written, unless it holds what the writer is known to refuse, and from then on nothing changes.
+int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
+{
+    const auto value = parsePropertyList(textOf(data, size));
+    if (!value) {
+        check(value.error().code == kFormatMalformed && !value.error().reason().empty());
+        return 0;
+    }
+    const auto written = toPropertyList(*value);
+    if (!written) {
+        check(fuzz::anyOf(*value, mayBeRefused), written.error().reason());
+        return 0;
+    }
+    const auto again = parsePropertyList(*written);
+    check(again.has_value(), again ? "" : again.error().reason());
+    check(fuzz::equalBy(*value, *again, sameOnceWritten), toJson(*value) + " became " + toJson(*again));
+
+    const auto third = parsePropertyList(toPropertyList(*again).value());
+    check(third && fuzz::equalBy(*again, *third, same), toJson(*again));
+    return 0;
+}

@@ -1,0 +1,29 @@
+#pragma once
+
+#include "fuzz/Check.h"
+#include "platform/Record.h"
+#include "tavrind/TavrinFeedback.h"
+
+namespace fuzz {
+
+/// Checks that a record from outside comes back whole from both of its encodings. Archives are compared, not values:
+/// they hold every field, and a number that is none equals itself there.
+inline void checkRoundTrips(const platform::Record& record)
+{
+    const auto& classes = tavrin::tavrindRecordClasses();
+    const std::string bytes = platform::archive(record);
+    for (const auto& again :
+         {platform::unarchive(bytes, classes), platform::recordFromValue(platform::toValue(record), classes)}) {
+        check(again.has_value(), again ? "" : again.error().description());
+        check(platform::archive(**again) == bytes, std::string(record.className()));
+    }
+}
+
+/// Checks that a refusal says why.
+inline void checkRefusal(const platform::Error& error)
+{
+    check(error.domain == platform::kFormatErrorDomain && !error.reason().empty(), error.description());
+    check(error.code == platform::kFormatMalformed || error.code == platform::kFormatUnknownClass, error.description());
+}
+
+} // namespace fuzz

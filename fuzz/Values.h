@@ -1,0 +1,68 @@
+#pragma once
+
+#include <algorithm>
+#include <charconv>
+#include <cmath>
+#include <string>
+#include <string_view>
+
+#include "platform/Value.h"
+
+/// Help for fuzz targets whose input is a JSON text that stands for a richer value.
+namespace fuzz {
+
+using platform::Value;
+
+/// `value` with bytes for each text "bytes:…", and a date for each text "date:SECONDS": what JSON doesn't have.
+inline Value enriched(const Value& value)
+{
+    constexpr std::string_view kBytes = "bytes:";
+    constexpr std::string_view kDate = "date:";
+    if (const std::string* text = value.asString()) {
+        if (text->starts_with(kBytes)) return platform::Bytes(text->substr(kBytes.size()));
+        std::int64_t seconds = 0;
+        if (text->starts_with(kDate) &&
+            std::from_chars(text->data() + kDate.size(), text->data() + text->size(), seconds).ec == std::errc())
+            return platform::dateFromSecondsSince1970(static_cast<double>(seconds));
+        return value;
+    }
+    if (const Value::Array* array = value.asArray()) {
+        Value::Array elements;
+        for (const Value& element : *array) elements.push_back(enriched(element));
+        return elements;
+    }
+    if (const platform::Dictionary* dictionary = value.asDictionary()) {
+        platform::Dictionary entries;
+        for (const auto& [key, entry] : *dictionary) entries.set(key, enriched(entry));
+        return entries;
+    }
+    return value;
+}
+
+/// Whether `leaf` holds for every value of two trees that have the same arrays, keys and leaves.
+template <class Leaf> bool equalBy(const Value& a, const Value& b, Leaf leaf)
+{
+    const auto equal = [&](const Value& x, const Value& y) { return equalBy(x, y, leaf); };
+    if (a.asArray() && b.asArray()) return std::ranges::equal(*a.asArray(), *b.asArray(), equal);
+    if (a.asDictionary() && b.asDictionary()) {
+        return a.count() == b.count() && std::ranges::all_of(*a.asDictionary(), [&](const auto& entry) {
+                   const Value* other = b.asDictionary()->find(entry.first);
+                   return other && equal(entry.second, *other);
+               });
+    }
+    return leaf(a, b);
+}
+
+/// Whether `holds` for any value of a tree. Keys of dictionaries count as texts.
+template <class Holds> bool anyOf(const Value& value, Holds holds)
+{
+    if (holds(value)) return true;
+    if (const Value::Array* array = value.asArray())
+        return std::ranges::any_of(*array, [&](const Value& element) { return anyOf(element, holds); });
+    if (const platform::Dictionary* dictionary = value.asDictionary())
+        return std::ranges::any_of(
+            *dictionary, [&](const auto& entry) { return holds(Value(entry.first)) || anyOf(entry.second, holds); });
+    return false;
+}
+
+} // namespace fuzz
