@@ -18,7 +18,7 @@ using Handle = std::unique_ptr<CURLU, decltype(&curl_url_cleanup)>;
 Handle parsed(const std::string& text)
 {
     Handle handle(curl_url(), curl_url_cleanup);
-    constexpr unsigned kFlags = CURLU_NON_SUPPORT_SCHEME | CURLU_NO_AUTHORITY;
+    constexpr unsigned kFlags = CURLU_NON_SUPPORT_SCHEME | CURLU_NO_AUTHORITY | CURLU_PATH_AS_IS;
     if (!handle || curl_url_set(handle.get(), CURLUPART_URL, text.c_str(), kFlags) != CURLUE_OK)
         return {nullptr, curl_url_cleanup};
     return handle;
@@ -79,6 +79,26 @@ int hexDigit(char c)
     return -1;
 }
 
+/// The byte that the escape at `at` stands for, or -1 where there is no whole one.
+int escapedByte(std::string_view text, std::size_t at)
+{
+    if (text[at] != '%' || at + 2 >= text.size()) return -1;
+    const int high = hexDigit(text[at + 1]);
+    const int low = hexDigit(text[at + 2]);
+    return high < 0 || low < 0 ? -1 : high << 4 | low;
+}
+
+/// Encodes each "%" that begins no escape.
+std::string withWholeEscapes(std::string_view text)
+{
+    std::string result;
+    for (std::size_t i = 0; i < text.size(); ++i) {
+        result.push_back(text[i]);
+        if (text[i] == '%' && escapedByte(text, i) < 0) result += "25";
+    }
+    return result;
+}
+
 } // namespace
 
 std::string percentEncodeQueryComponent(std::string_view text)
@@ -98,10 +118,8 @@ std::string percentDecode(std::string_view text)
     std::string result;
     result.reserve(text.size());
     for (std::size_t i = 0; i < text.size(); ++i) {
-        const int high = text[i] == '%' && i + 2 < text.size() ? hexDigit(text[i + 1]) : -1;
-        const int low = high >= 0 ? hexDigit(text[i + 2]) : -1;
-        if (low >= 0) {
-            result.push_back(static_cast<char>(high << 4 | low));
+        if (const int byte = escapedByte(text, i); byte >= 0) {
+            result.push_back(static_cast<char>(byte));
             i += 2;
         } else {
             result.push_back(text[i]);
@@ -116,6 +134,7 @@ std::optional<Url> Url::parse(std::string_view text)
     if (text.empty() || text.size() > kMaximumLength || std::ranges::any_of(text, isControl)) return std::nullopt;
 
     std::string encoded = percentEncode(text, isUrlCharacter);
+    if (encoded.contains('%')) encoded = withWholeEscapes(encoded);
     const std::size_t colon = encoded.find(':');
     const std::string_view scheme = std::string_view(encoded).substr(0, colon);
     const bool hasScheme = colon != std::string::npos && colon > 0 && isUnreserved(scheme[0]) && scheme[0] > '9' &&

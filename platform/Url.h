@@ -7,13 +7,14 @@
 
 namespace platform {
 
-/// An absolute URL that has been checked: it has a scheme, and its text is valid (RFC 3986).
+/// An absolute URL that has been checked: it has a scheme and an authority or absolute path (no "mailto:"), and its
+/// text holds no character that a URL can't hold (RFC 3986).
 class Url {
 public:
     Url() = default;
 
-    /// Nothing for text that is no absolute URL. Characters that a URL can't hold are percent-encoded first, as a
-    /// user would expect of a pasted one.
+    /// Nothing for text that is no absolute URL, has control characters or is longer than 64 KiB. Characters that a URL
+    /// can't hold, and a "%" that begins no escape, are percent-encoded first, as a user would expect of a pasted one.
     [[nodiscard]] static std::optional<Url> parse(std::string_view text);
 
     /// The URL's text, as it goes on the wire. Empty for a default `Url`.
