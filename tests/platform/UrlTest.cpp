@@ -1,0 +1,141 @@
+#include <gtest/gtest.h>
+
+#include "platform/Url.h"
+
+namespace platform {
+namespace {
+
+TEST(Url, OnlyAbsoluteUrlsAreTaken)
+{
+    const std::string tooLong = "http://h/" + std::string(64 << 10, 'x');
+    for (const std::string& text :
+         {std::string(), std::string("x"), std::string("/x"), std::string("//h/x"), std::string("1a://h"),
+          std::string("://h"), std::string("h_t://h"), std::string("http://h h/"), std::string("http://[::1"),
+          std::string("http://h:99999/"), std::string("http://h:x/"), std::string("http://h/\n"),
+          std::string("http://h/a\tb"), std::string("http://h/\0x", 11), std::string("http://h/\x7f"), tooLong})
+        EXPECT_EQ(Url::parse(text), std::nullopt) << text.substr(0, 40);
+    EXPECT_TRUE(Url::parse(tooLong.substr(0, 64 << 10)));
+    EXPECT_TRUE(Url().empty());
+}
+
+TEST(Url, IsTakenApart)
+{
+    const struct {
+        std::string text, scheme, host;
+        std::optional<unsigned> port;
+        std::string path;
+        std::optional<std::string> query;
+    } cases[]{
+        {"HTTPS://Example.COM:8443/A/b?C=d#E", "https", "example.com", 8443, "/A/b", "C=d"},
+        {"http://h", "http", "h", std::nullopt, "/", std::nullopt},
+        {"http://h?", "http", "h", std::nullopt, "/", ""},
+        {"http://h?a=b?c/d", "http", "h", std::nullopt, "/", "a=b?c/d"},
+        {"http://h#f?a=b", "http", "h", std::nullopt, "/", std::nullopt},
+        {"http://h/x#f?a=b", "http", "h", std::nullopt, "/x", std::nullopt},
+        {"http://user:secret@h/", "http", "h", std::nullopt, "/", std::nullopt},
+        {"http://good.example@evil.example/", "http", "evil.example", std::nullopt, "/", std::nullopt},
+        {"http://[2001:DB8::1]:80/", "http", "[2001:db8::1]", 80, "/", std::nullopt},
+        {"file:///etc/x", "file", "", std::nullopt, "/etc/x", std::nullopt},
+        {"x-app.2+b://open", "x-app.2+b", "open", std::nullopt, "/", std::nullopt},
+        {"http://h/a/../b%2Fc;d/", "http", "h", std::nullopt, "/a/../b%2Fc;d/", std::nullopt},
+    };
+    for (const auto& c : cases) {
+        const auto url = Url::parse(c.text);
+        ASSERT_TRUE(url) << c.text;
+        EXPECT_EQ(url->string(), c.text);
+        EXPECT_EQ(url->scheme(), c.scheme) << c.text;
+        EXPECT_EQ(url->host(), c.host) << c.text;
+        EXPECT_EQ(url->port(), c.port) << c.text;
+        EXPECT_EQ(url->path(), c.path) << c.text;
+        EXPECT_EQ(url->query(), c.query) << c.text;
+    }
+}
+
+TEST(Url, WhatAUrlCannotHoldIsEncodedOnce)
+{
+    const std::pair<std::string, std::string> cases[]{
+        {"http://h/a b", "http://h/a%20b"},   {"http://h/ü?q=日", "http://h/%C3%BC?q=%E6%97%A5"},
+        {"http://h/a%20b", "http://h/a%20b"}, {"http://h/%zz", "http://h/%25zz"},
+        {"http://h/100%", "http://h/100%25"}, {"http://h/100%4", "http://h/100%254"},
+        {"http://h/%%41", "http://h/%25%41"}, {"http://h/<\">^`{|}\\", "http://h/%3C%22%3E%5E%60%7B%7C%7D%5C"},
+        {"http://h/\xff", "http://h/%FF"},    {"http://h/a+b;c'(d)*,~", "http://h/a+b;c'(d)*,~"},
+    };
+    for (const auto& [text, encoded] : cases) {
+        const auto url = Url::parse(text);
+        ASSERT_TRUE(url) << text;
+        EXPECT_EQ(url->string(), encoded);
+        EXPECT_EQ(Url::parse(encoded), url) << "encoding again changes nothing";
+    }
+}
+
+TEST(PercentEncoding, KeepsWhatMayStay)
+{
+    const struct {
+        std::string text, inQuery, inPath;
+    } cases[]{
+        {"azAZ09-._~", "azAZ09-._~", "azAZ09-._~"},
+        {"a b", "a%20b", "a%20b"},
+        {"c++", "c%2B%2B", "c%2B%2B"},
+        {"a&b=c#d%e", "a%26b%3Dc%23d%25e", "a%26b%3Dc%23d%25e"},
+        {"/?:@!$'()*,;", "/?:@!$'()*,;", "%2F%3F%3A%40%21%24%27%28%29%2A%2C%3B"},
+        {"\"<>[]\\^`{|}", "%22%3C%3E%5B%5D%5C%5E%60%7B%7C%7D", "%22%3C%3E%5B%5D%5C%5E%60%7B%7C%7D"},
+        {"ü日😀", "%C3%BC%E6%97%A5%F0%9F%98%80", "%C3%BC%E6%97%A5%F0%9F%98%80"},
+        {std::string("\0\n\x7f\xff", 4), "%00%0A%7F%FF", "%00%0A%7F%FF"},
+    };
+    for (const auto& c : cases) {
+        EXPECT_EQ(percentEncodeQueryComponent(c.text), c.inQuery);
+        EXPECT_EQ(percentEncodePathSegment(c.text), c.inPath);
+        EXPECT_EQ(percentDecode(c.inQuery), c.text);
+        EXPECT_EQ(percentDecode(c.inPath), c.text);
+    }
+}
+
+TEST(PercentEncoding, InvalidEscapesStandForThemselves)
+{
+    const std::pair<std::string, std::string> cases[]{{"%", "%"},         {"a%4", "a%4"}, {"%zz", "%zz"},
+                                                      {"%4z%41", "%4zA"}, {"%%41", "%A"}, {"%c3%BC", "ü"},
+                                                      {"+", "+"},         {"%2B", "+"}};
+    for (const auto& [text, decoded] : cases) EXPECT_EQ(percentDecode(text), decoded) << text;
+}
+
+TEST(UrlComponents, ItemsOfTheServiceComeBackUnchanged)
+{
+    for (const char* query :
+         {"a=1&b=2", "a+b=c+d", "q=%7e%2f", "a;b=1;2", "a==b", "a", "a=", "=b", "a=1&a=2&a", "%zz=%"}) {
+        const Url url = *Url::parse(std::string("http://h/p?") + query + "#f");
+        UrlComponents components(url);
+        components.setQueryItems(components.queryItems());
+        EXPECT_EQ(components.url(), url);
+    }
+}
+
+TEST(UrlComponents, ItemsAreReadInOrder)
+{
+    const auto items = UrlComponents(*Url::parse("http://h/?a=1&&b=x%26y&a=2&c&d=&=e&f=g=h&i+j=k+l#z=1")).queryItems();
+    std::string read;
+    for (const auto& item : items) read += "[" + item.name + "]" + (item.value ? "=[" + *item.value + "]" : "") + " ";
+    EXPECT_EQ(read, "[a]=[1] [b]=[x&y] [a]=[2] [c] [d]=[] []=[e] [f]=[g=h] [i+j]=[k+l] ");
+
+    const Url url = *Url::parse("http://h/?a=1&a=2&b&c=%C3%BC+d");
+    EXPECT_EQ(url.queryValue("a"), "1") << "the first";
+    EXPECT_EQ(url.queryValue("b"), std::nullopt);
+    EXPECT_EQ(url.queryValue("c"), "ü+d");
+    EXPECT_EQ(url.queryValue("d"), std::nullopt);
+}
+
+TEST(UrlComponents, ItemsOfOursCannotBreakOutOfTheQuery)
+{
+    UrlComponents components(*Url::parse("http://h/p?old#f"));
+    components.setQueryItems({{"q", "a&b=c#d"}, {"n=m", "c++ ü"}, {"bare"}, {"empty", ""}});
+    EXPECT_EQ(components.url().string(), "http://h/p?q=a%26b%3Dc%23d&n%3Dm=c%2B%2B%20%C3%BC&bare&empty=#f");
+    const auto back = UrlComponents(components.url()).queryItems();
+    ASSERT_EQ(back.size(), 4u);
+    EXPECT_EQ(back[0].value, "a&b=c#d");
+    EXPECT_EQ(back[1].name, "n=m");
+    EXPECT_EQ(back[1].value, "c++ ü");
+    components.setQueryItems({});
+    EXPECT_EQ(components.url().string(), "http://h/p#f");
+}
+
+} // namespace
+} // namespace platform

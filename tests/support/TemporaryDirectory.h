@@ -1,0 +1,42 @@
+#pragma once
+
+#include <filesystem>
+#include <fstream>
+#include <stdlib.h>
+#include <string>
+#include <string_view>
+
+#include "platform/RunLoop.h"
+
+namespace platform::test {
+
+/// A new directory, mode 0700, that goes with all that is in it.
+struct TemporaryDirectory {
+    TemporaryDirectory()
+    {
+        std::string name = (std::filesystem::temp_directory_path() / "platform-XXXXXX").string();
+        path = mkdtemp(name.data());
+    }
+    ~TemporaryDirectory() { std::filesystem::remove_all(path); }
+    TemporaryDirectory(const TemporaryDirectory&) = delete;
+    TemporaryDirectory& operator=(const TemporaryDirectory&) = delete;
+
+    [[nodiscard]] std::filesystem::path operator/(std::string_view name) const { return path / name; }
+
+    std::filesystem::path path;
+};
+
+/// Writes a file as an editor does, in place.
+inline void writeFile(const std::filesystem::path& path, std::string_view contents)
+{
+    std::ofstream(path, std::ios::binary) << contents;
+}
+
+/// Dispatches the loop until `done`; false where that takes more than ten seconds.
+template <class Done> bool runUntil(RunLoop& loop, Done done)
+{
+    for (int i = 0; i < 1000 && !done(); ++i) loop.runOnce(std::chrono::milliseconds(10));
+    return done();
+}
+
+} // namespace platform::test
