@@ -1,6 +1,8 @@
 #pragma once
 
 #include <chrono>
+#include <cmath>
+#include <cstdint>
 
 namespace platform {
 
@@ -10,7 +12,14 @@ using Date = std::chrono::sys_time<std::chrono::nanoseconds>;
 /// A span of time.
 using Duration = std::chrono::nanoseconds;
 
-[[nodiscard]] inline double toSeconds(Duration d) { return std::chrono::duration<double>(d).count(); }
+// Whole seconds and the rest apart: nanoseconds since 1970 are more than a double holds exactly.
+
+/// The seconds nearest to `d`.
+[[nodiscard]] inline double toSeconds(Duration d)
+{
+    const auto whole = std::chrono::duration_cast<std::chrono::seconds>(d);
+    return static_cast<double>(whole.count()) + std::chrono::duration<double>(d - whole).count();
+}
 
 /// Seconds since 1970, UTC.
 [[nodiscard]] inline double secondsSince1970(Date date) { return toSeconds(date.time_since_epoch()); }
@@ -22,7 +31,8 @@ using Duration = std::chrono::nanoseconds;
     if (!(seconds == seconds)) return Duration::zero();
     if (seconds > kLimit) seconds = kLimit;
     if (seconds < -kLimit) seconds = -kLimit;
-    return std::chrono::duration_cast<Duration>(std::chrono::duration<double>(seconds));
+    const double whole = std::trunc(seconds);
+    return std::chrono::seconds(static_cast<std::int64_t>(whole)) + Duration(std::llround((seconds - whole) * 1e9));
 }
 
 /// The moment `seconds` after 1970, clamped like `durationFromSeconds`.
