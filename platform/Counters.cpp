@@ -18,10 +18,11 @@ namespace platform {
 namespace {
 
 constexpr std::chrono::seconds kBatch{60};
-constexpr std::size_t kMaximumSize = 4u << 20; // more than the counters below can take
 /// Keys are built from clients' names and agents: a hostile one must not fill the memory.
 constexpr std::size_t kMaximumCounters = 4096;
 constexpr std::size_t kMaximumKeyLength = 512;
+/// As many counters as there may be, with keys of escapes ("\u0001") and numbers of 20 digits, can be read back.
+constexpr std::size_t kMaximumSize = kMaximumCounters * (6 * kMaximumKeyLength + 32);
 
 struct KeyHash {
     using is_transparent = void;

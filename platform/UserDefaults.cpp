@@ -32,7 +32,7 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
     std::set<std::string, std::less<>> dirty; // set here, not yet in the file
     bool writeQueued = false;
     bool fileIsBroken = false;
-    std::mutex writing; // one writer at a time; taken before `mutex`
+    std::mutex writing; // one reader or writer of the file at a time; taken before `mutex`
     std::unique_ptr<FileWatch> watch;
 
     /// What the file has; nothing where it is missing, an error where it can't be read or is no JSON object.
@@ -50,6 +50,7 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
 
     void load()
     {
+        std::lock_guard reader(writing); // what is read here must not be older than what a writer leaves
         auto contents = readFile();
         std::lock_guard lock(mutex);
         fileIsBroken = !contents;
@@ -71,6 +72,11 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
     void write()
     {
         std::lock_guard writer(writing);
+        {
+            std::lock_guard lock(mutex);
+            writeQueued = false;
+            if (dirty.empty()) return;
+        }
         if (auto made = files->createDirectories(path.parent_path()); !made) return writeFailed(made.error());
         // Against others who edit the file in the same way; where there can be no lock, we go on without.
         const FileHandle lockFile(
@@ -83,8 +89,6 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
         std::set<std::string, std::less<>> written;
         {
             std::lock_guard lock(mutex);
-            writeQueued = false;
-            if (dirty.empty()) return;
             written.swap(dirty);
             for (const std::string& key : written) {
                 if (const Value* mine = values.find(key))
@@ -130,7 +134,10 @@ UserDefaults::UserDefaults(FileSystem& files, fs::path path, std::shared_ptr<Que
     _impl->load();
 }
 
-UserDefaults::~UserDefaults() = default;
+UserDefaults::~UserDefaults()
+{
+    _impl->watch.reset(); // here, on the loop's thread: a write that waits may keep the rest
+}
 
 void UserDefaults::registerDefaults(const Dictionary& defaults)
 {
