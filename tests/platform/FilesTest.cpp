@@ -1,0 +1,157 @@
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <csignal>
+#include <fcntl.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include "platform/Files.h"
+#include "tests/support/TemporaryDirectory.h"
+
+namespace platform {
+namespace {
+
+namespace fs = std::filesystem;
+using test::writeFile;
+
+struct FilesTest : testing::Test {
+    static std::int64_t failure(const auto& result) { return result ? 0 : result.error().code; }
+    std::string contents(const fs::path& path) const { return std::string(files->read(path, 1 << 20)->view()); }
+    static unsigned mode(const fs::path& path)
+    {
+        struct stat status {};
+        return stat(path.c_str(), &status) == 0 ? status.st_mode & 07777 : 0;
+    }
+
+    test::TemporaryDirectory directory;
+    std::unique_ptr<FileSystem> files = makeSystemFiles();
+};
+
+TEST_F(FilesTest, OnlyTheOwnerMayReadWhatIsMade)
+{
+    const mode_t before = umask(0);
+    EXPECT_TRUE(files->createDirectories(directory / "a/b/c"));
+    EXPECT_TRUE(files->createDirectories(directory / "a/b/c")) << "one that is there is fine";
+    EXPECT_TRUE(files->writeAtomically(directory / "a/file", "x"));
+    writeFile(directory / "shared", "old");
+    chmod((directory / "shared").c_str(), 0644);
+    EXPECT_TRUE(files->writeAtomically(directory / "shared", "new"));
+    umask(before);
+    for (const char* made : {"a", "a/b", "a/b/c"}) EXPECT_EQ(mode(directory / made), 0700u) << made;
+    for (const char* made : {"a/file", "shared"}) EXPECT_EQ(mode(directory / made), 0600u) << made;
+}
+
+TEST_F(FilesTest, ReadsWholeFilesUpToTheLimitAndNothingElse)
+{
+    const std::string large(200'000, '\0');
+    writeFile(directory / "large", large);
+    writeFile(directory / "empty", "");
+    writeFile(directory / "file", "1234");
+    fs::create_symlink(directory / "file", directory / "link");
+    fs::create_symlink(directory / "none", directory / "dangling");
+    fs::create_directory(directory / "directory");
+    ASSERT_EQ(mkfifo((directory / "pipe").c_str(), 0600), 0);
+    const struct {
+        const char* name;
+        std::size_t limit;
+        std::int64_t error;
+    } cases[]{{"file", 4, 0},           {"file", 3, EFBIG},        {"file", 0, EFBIG},  {"empty", 0, 0},
+              {"large", 200'000, 0},    {"large", 199'999, EFBIG}, {"link", 9, ELOOP},  {"dangling", 9, ELOOP},
+              {"directory", 9, EISDIR}, {"pipe", 9, EINVAL},       {"none", 9, ENOENT}, {"file/x", 9, ENOTDIR}};
+    for (const auto& c : cases) {
+        const auto read = files->read(directory / c.name, c.limit);
+        EXPECT_EQ(failure(read), c.error) << c.name << " " << c.limit;
+        EXPECT_EQ(read ? read->size() : 0, read ? fs::file_size(directory / c.name) : 0);
+        const auto opened = files->openForReading(directory / c.name);
+        EXPECT_EQ(failure(opened), c.error == EFBIG ? 0 : c.error) << c.name;
+    }
+}
+
+TEST_F(FilesTest, PublishingReplacesALinkAndLeavesItsTarget)
+{
+    writeFile(directory / "target", "precious");
+    fs::create_symlink(directory / "target", directory / "link");
+    EXPECT_TRUE(files->writeAtomically(directory / "link", "new"));
+    EXPECT_EQ(contents(directory / "target"), "precious");
+    EXPECT_EQ(contents(directory / "link"), "new");
+    EXPECT_FALSE(fs::is_symlink(directory / "link"));
+}
+
+TEST_F(FilesTest, AReaderKeepsTheFileThatItOpened)
+{
+    writeFile(directory / "file", "old");
+    const auto reader = files->openForReading(directory / "file");
+    EXPECT_TRUE(files->writeAtomically(directory / "file", "newer"));
+    std::array<char, 8> buffer{};
+    EXPECT_EQ(read(reader->fd(), buffer.data(), buffer.size()), 3);
+    EXPECT_STREQ(buffer.data(), "old") << "never a mixture";
+    EXPECT_EQ(contents(directory / "file"), "newer");
+}
+
+TEST_F(FilesTest, AWriteThatFailsLeavesTheOldFileAndNoOther)
+{
+    writeFile(directory / "file", "old");
+    fs::create_directory(directory / "directory");
+
+    // The limit stands for a full disk: the write is cut short.
+    rlimit before{};
+    getrlimit(RLIMIT_FSIZE, &before);
+    const auto handler = signal(SIGXFSZ, SIG_IGN);
+    const rlimit small{.rlim_cur = 4096, .rlim_max = before.rlim_max};
+    setrlimit(RLIMIT_FSIZE, &small);
+    const auto full = files->writeAtomically(directory / "file", std::string(10'000, 'x'));
+    setrlimit(RLIMIT_FSIZE, &before);
+    signal(SIGXFSZ, handler);
+
+    EXPECT_EQ(failure(full), EFBIG);
+    EXPECT_EQ(failure(files->writeAtomically(directory / "directory", "x")), EISDIR);
+    EXPECT_EQ(failure(files->writeAtomically(directory / "none/file", "x")), ENOENT);
+    EXPECT_EQ(failure(files->createDirectories(directory / "file/below")), ENOTDIR);
+    EXPECT_EQ(failure(files->createDirectories(directory / "file")), ENOTDIR);
+    EXPECT_EQ(contents(directory / "file"), "old");
+    EXPECT_EQ(files->list(directory.path)->size(), 2u) << "no temporary files are left";
+}
+
+TEST_F(FilesTest, TellsWhatThereIs)
+{
+    writeFile(directory / "file", "1234");
+    fs::create_symlink(directory / "file", directory / "link");
+    EXPECT_EQ(files->info(directory / "file")->size, 4u);
+    EXPECT_EQ(files->info(directory / "file")->kind, FileInfo::Kind::File);
+    EXPECT_EQ(files->info(directory.path)->kind, FileInfo::Kind::Directory);
+    EXPECT_EQ(files->info(directory / "link")->kind, FileInfo::Kind::Other) << "a link isn't what it points to";
+    EXPECT_GT(secondsSince1970(files->info(directory / "file")->modified), 1.7e9);
+    EXPECT_EQ(failure(files->info(directory / "none")), ENOENT);
+
+    auto names = *files->list(directory.path);
+    std::ranges::sort(names);
+    EXPECT_EQ(names, (std::vector<std::string>{"file", "link"}));
+    EXPECT_EQ(failure(files->list(directory / "none")), ENOENT);
+    EXPECT_TRUE(files->remove(directory / "link"));
+    EXPECT_EQ(contents(directory / "file"), "1234");
+    EXPECT_EQ(failure(files->remove(directory / "link")), ENOENT);
+}
+
+TEST(Directories, RelativeOrMissingVariablesCountAsUnset)
+{
+    setenv("HOME", "/home/me", 1);
+    setenv("XDG_CACHE_HOME", "/elsewhere", 1);
+    setenv("XDG_CONFIG_HOME", "relative/config", 1);
+    setenv("XDG_STATE_HOME", "", 1);
+    unsetenv("XDG_DATA_HOME");
+    setenv("TMPDIR", "/tmp/mine", 1);
+    unsetenv("XDG_RUNTIME_DIR");
+    const Directories found = Directories::fromEnvironment();
+    unsetenv("TMPDIR");
+    EXPECT_EQ(found.caches, "/elsewhere");
+    EXPECT_EQ(found.config, "/home/me/.config");
+    EXPECT_EQ(found.state, "/home/me/.local/state");
+    EXPECT_EQ(found.data, "/home/me/.local/share");
+    EXPECT_EQ(found.temporary, "/tmp/mine");
+    EXPECT_EQ(found.runtime, "/tmp/mine/runtime-" + std::to_string(getuid()));
+}
+
+} // namespace
+} // namespace platform
