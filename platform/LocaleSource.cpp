@@ -97,13 +97,21 @@ std::optional<std::string> setting(const fs::path& file, std::string_view name)
     return std::nullopt;
 }
 
-constexpr const char* kLocaleFiles[] = {"/etc/locale.conf", "/etc/default/locale"};
-constexpr const char* kLocalTime = "/etc/localtime";
-constexpr const char* kKeyboardFile = "/etc/default/keyboard";
+/// "/usr/share/zoneinfo/Europe/Zurich" → "Europe/Zurich"; nothing for a path outside the database.
+std::optional<std::string> zoneOfPath(std::string_view path)
+{
+    constexpr std::string_view kDatabase = "zoneinfo/";
+    const std::size_t at = path.find(kDatabase);
+    return at == std::string_view::npos ? std::nullopt : std::optional(std::string(path.substr(at + kDatabase.size())));
+}
+
+constexpr const char* kLocaleFiles[] = {"locale.conf", "default/locale"};
+constexpr const char* kLocalTime = "localtime";
+constexpr const char* kKeyboardFile = "default/keyboard";
 
 class SystemLocale final : public LocaleSource {
 public:
-    explicit SystemLocale(RunLoop& runLoop) : _runLoop(runLoop) {}
+    SystemLocale(RunLoop& runLoop, fs::path etc) : _runLoop(runLoop), _etc(std::move(etc)) {}
 
     LocaleContext locale() override
     {
@@ -117,14 +125,14 @@ public:
 
     std::string timeZone() override
     {
-        if (const auto fromEnvironment = environment("TZ"))
-            return fromEnvironment->substr(fromEnvironment->front() == ':');
+        if (const auto fromEnvironment = environment("TZ")) {
+            const std::string zone = fromEnvironment->substr(fromEnvironment->front() == ':');
+            return zoneOfPath(zone).value_or(zone);
+        }
         std::error_code failed;
-        const std::string target = fs::read_symlink(kLocalTime, failed).string();
-        constexpr std::string_view kDatabase = "zoneinfo/";
-        const std::size_t at = target.find(kDatabase);
-        if (!failed && at != std::string::npos) return target.substr(at + kDatabase.size());
-        std::ifstream file("/etc/timezone");
+        const std::string target = fs::read_symlink(_etc / kLocalTime, failed).string();
+        if (const auto zone = zoneOfPath(target); zone && !failed) return *zone;
+        std::ifstream file(_etc / "timezone");
         std::string name;
         if (std::getline(file, name) && !name.empty()) return name;
         return "UTC";
@@ -132,7 +140,7 @@ public:
 
     std::string keyboardInputMode() override
     {
-        auto layout = setting(kKeyboardFile, "XKBLAYOUT");
+        auto layout = setting(_etc / kKeyboardFile, "XKBLAYOUT");
         if (!layout) return {};
         const std::string first = layout->substr(0, layout->find(','));
         if (first.empty()) return {};
@@ -157,8 +165,8 @@ private:
         if (_filesChanged) {
             for (const char* file : kLocaleFiles) {
                 for (const char* key : {"LC_ALL", "LC_MESSAGES", "LANG"})
-                    if (!name) name = setting(file, key);
-                if (name) languages = setting(file, "LANGUAGE");
+                    if (!name) name = setting(_etc / file, key);
+                if (name) languages = setting(_etc / file, "LANGUAGE");
                 if (name) break;
             }
         }
@@ -172,8 +180,9 @@ private:
     {
         _runLoop.execute(Priority::Default, [this] {
             for (const char* file : kLocaleFiles)
-                _watches.push_back(std::make_unique<FileWatch>(_runLoop, file, [this] { localeChanged(); }));
-            _watches.push_back(std::make_unique<FileWatch>(_runLoop, kLocalTime, [this] { tell(Change::TimeZone); }));
+                _watches.push_back(std::make_unique<FileWatch>(_runLoop, _etc / file, [this] { localeChanged(); }));
+            _watches.push_back(
+                std::make_unique<FileWatch>(_runLoop, _etc / kLocalTime, [this] { tell(Change::TimeZone); }));
         });
     }
 
@@ -200,6 +209,7 @@ private:
     }
 
     RunLoop& _runLoop;
+    const fs::path _etc;
     std::mutex _mutex;
     std::optional<LocaleContext> _locale; // under the mutex, like the next two
     bool _filesChanged = false;
@@ -245,9 +255,9 @@ LocaleContext localeContext(std::string_view localeName, std::string_view langua
     return context;
 }
 
-std::unique_ptr<LocaleSource> makeLocaleSource(RunLoop& runLoop)
+std::unique_ptr<LocaleSource> makeLocaleSource(RunLoop& runLoop, fs::path etc)
 {
-    return std::make_unique<SystemLocale>(runLoop);
+    return std::make_unique<SystemLocale>(runLoop, std::move(etc));
 }
 
 } // namespace platform

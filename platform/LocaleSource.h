@@ -1,5 +1,6 @@
 #pragma once
 
+#include <filesystem>
 #include <functional>
 #include <memory>
 #include <string>
@@ -16,7 +17,7 @@ struct LocaleContext {
     std::string systemLanguage = "en";          ///< language of the user interface, BCP 47: "de", "zh-Hant"
     std::vector<std::string> preferredLanguages{"en-US"}; ///< BCP 47, most preferred first
     std::string calendar = "gregorian";         ///< CLDR calendar type: "gregorian", "buddhist"
-    bool is24Hour = false;                      ///< the hour format (skeleton "j") is 00–23 or 01–24
+    bool is24Hour = false;                      ///< the hour format (skeleton "j") has two-digit hours of a day: "HH"
     std::string measurementSystem = "U.S.";     ///< "U.S.", "U.K." or "Metric"
     std::string region = "US";                  ///< ISO 3166 country code, or empty
 
@@ -46,7 +47,7 @@ public:
 
 /// LC_ALL, LC_*, LANG and LANGUAGE, overridden by /etc/locale.conf or /etc/default/locale when these change while
 /// the process runs; the time zone of TZ, else of /etc/localtime; the keyboard of /etc/default/keyboard. Changes are
-/// seen by inotify.
-[[nodiscard]] std::unique_ptr<LocaleSource> makeLocaleSource(RunLoop& runLoop);
+/// seen by inotify. `etc` stands for /etc.
+[[nodiscard]] std::unique_ptr<LocaleSource> makeLocaleSource(RunLoop& runLoop, std::filesystem::path etc = "/etc");
 
 } // namespace platform
