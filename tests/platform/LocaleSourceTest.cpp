@@ -1,0 +1,177 @@
+#include <gtest/gtest.h>
+
+#include "platform/LocaleSource.h"
+#include "platform/RunLoop.h"
+#include "tests/support/TemporaryDirectory.h"
+
+namespace platform {
+namespace {
+
+namespace fs = std::filesystem;
+using test::runUntil;
+using test::writeFile;
+
+TEST(LocaleContext, FollowsTheEnvironment)
+{
+    const struct {
+        const char* locale;
+        std::string identifier, region, calendar;
+        bool is24Hour;
+        std::string measurement, systemLanguage, preferred;
+    } cases[]{
+        {"de_CH.UTF-8", "de_CH", "CH", "gregorian", true, "Metric", "de", "de-CH"},
+        {"de_DE@euro", "de_DE", "DE", "gregorian", true, "Metric", "de", "de-DE"},
+        {"en_US.UTF-8", "en_US", "US", "gregorian", false, "U.S.", "en", "en-US"},
+        {"en_GB", "en_GB", "GB", "gregorian", true, "U.K.", "en", "en-GB"},
+        {"en_AU", "en_AU", "AU", "gregorian", false, "Metric", "en", "en-AU"},
+        {"th_TH", "th_TH", "TH", "buddhist", true, "Metric", "th", "th-TH"},
+        {"fa_IR", "fa_IR", "IR", "persian", false, "Metric", "fa", "fa-IR"},
+        {"zh_CN.GB18030", "zh_CN", "CN", "gregorian", false, "Metric", "zh", "zh-CN"},
+        {"zh_TW", "zh_TW", "TW", "gregorian", false, "Metric", "zh-Hant", "zh-TW"},
+        {"sr_RS", "sr_RS", "RS", "gregorian", true, "Metric", "sr", "sr-RS"},
+        {"fr", "fr", "", "gregorian", true, "Metric", "fr", "fr"},
+        {"", "en_US", "US", "gregorian", false, "U.S.", "en", "en-US"},
+        {"C", "en_US", "US", "gregorian", false, "U.S.", "en", "en-US"},
+        {"C.UTF-8", "en_US", "US", "gregorian", false, "U.S.", "en", "en-US"},
+        {"POSIX", "en_US", "US", "gregorian", false, "U.S.", "en", "en-US"},
+        {"@euro", "en_US", "US", "gregorian", false, "U.S.", "en", "en-US"},
+        {"_CH", "en_US", "US", "gregorian", false, "U.S.", "en", "en-US"},
+    };
+    for (const auto& c : cases) {
+        const LocaleContext context = localeContext(c.locale);
+        EXPECT_EQ(context.identifier, c.identifier) << c.locale;
+        EXPECT_EQ(context.region, c.region) << c.locale;
+        EXPECT_EQ(context.calendar, c.calendar) << c.locale;
+        EXPECT_EQ(context.is24Hour, c.is24Hour) << c.locale;
+        EXPECT_EQ(context.measurementSystem, c.measurement) << c.locale;
+        EXPECT_EQ(context.systemLanguage, c.systemLanguage) << c.locale;
+        EXPECT_EQ(context.preferredLanguages, std::vector{c.preferred}) << c.locale;
+    }
+    EXPECT_EQ(localeContext(std::string(100'000, 'x')), LocaleContext()) << "nonsense reads as nothing";
+}
+
+TEST(LocaleContext, LanguagesComeFirstAndOnce)
+{
+    using List = std::vector<std::string>;
+    const struct {
+        const char* languages;
+        List preferred;
+        std::string systemLanguage;
+    } cases[]{
+        {"fr:de_CH:en", {"fr", "de-CH", "en"}, "fr"},
+        {"fr_CA:fr_CA.UTF-8:fr", {"fr-CA", "fr", "de-CH"}, "fr"},
+        {"zh_HK:en", {"zh-HK", "en", "de-CH"}, "zh-Hant"},
+        {"::C:POSIX:", {"de-CH"}, "de"},
+        {"", {"de-CH"}, "de"},
+    };
+    for (const auto& c : cases) {
+        const LocaleContext context = localeContext("de_CH.UTF-8", c.languages);
+        EXPECT_EQ(context.preferredLanguages, c.preferred) << c.languages;
+        EXPECT_EQ(context.systemLanguage, c.systemLanguage) << c.languages;
+        EXPECT_EQ(context.identifier, "de_CH") << "languages don't move the region";
+    }
+}
+
+struct SystemLocale : testing::Test {
+    static constexpr const char* kVariables[]{"LC_ALL", "LC_MESSAGES", "LANG", "LANGUAGE", "TZ"};
+    SystemLocale()
+    {
+        for (const char* variable : kVariables) unsetenv(variable);
+        fs::create_directory(etc / "default");
+    }
+    ~SystemLocale() override
+    {
+        for (const char* variable : kVariables) unsetenv(variable);
+    }
+    std::unique_ptr<LocaleSource> make() { return makeLocaleSource(loop, etc.path); }
+    void dispatch() { loop.runOnce(std::chrono::milliseconds(0)); }
+
+    test::TemporaryDirectory etc;
+    RunLoop loop;
+};
+
+TEST_F(SystemLocale, VariablesOverrideEachOtherInTheirOrder)
+{
+    EXPECT_EQ(make()->locale().identifier, "en_US");
+    setenv("LANG", "de_DE.UTF-8", 1);
+    EXPECT_EQ(make()->locale().identifier, "de_DE");
+    setenv("LC_MESSAGES", "fr_FR.UTF-8", 1);
+    EXPECT_EQ(make()->locale().identifier, "fr_FR");
+    setenv("LC_ALL", "it_IT.UTF-8", 1);
+    EXPECT_EQ(make()->locale().identifier, "it_IT");
+    setenv("LC_ALL", "", 1);
+    setenv("LANGUAGE", "rm:de", 1);
+    EXPECT_EQ(make()->locale().identifier, "fr_FR") << "an empty variable is none";
+    EXPECT_EQ(make()->locale().systemLanguage, "rm");
+}
+
+TEST_F(SystemLocale, ChangesOfTheSystemAreToldOnceEach)
+{
+    setenv("LANG", "de_DE.UTF-8", 1);
+    writeFile(etc / "locale.conf", "LANG=fr_FR.UTF-8\n");
+    fs::create_symlink("/usr/share/zoneinfo/Europe/Rome", etc / "localtime");
+    const auto source = make();
+    int locales = 0, zones = 0;
+    source->onChange(
+        [&](LocaleSource::Change change) { ++(change == LocaleSource::Change::Locale ? locales : zones); });
+    EXPECT_EQ(source->locale().identifier, "de_DE") << "the login made its environment from the files";
+    dispatch(); // the watches are there now
+
+    writeFile(etc / "locale.conf", "# by hand\nLC_TIME=xx\nLANG=\"it_CH.UTF-8\"\nLANGUAGE=it:rm\n");
+    EXPECT_TRUE(runUntil(loop, [&] { return locales == 1; }));
+    EXPECT_EQ(source->locale().identifier, "it_CH");
+    EXPECT_EQ(source->locale().preferredLanguages, (std::vector<std::string>{"it", "rm", "it-CH"}));
+
+    fs::create_symlink("/usr/share/zoneinfo/Europe/Zurich", etc / "new");
+    fs::rename(etc / "new", etc / "localtime");
+    EXPECT_TRUE(runUntil(loop, [&] { return zones == 1; }));
+    EXPECT_EQ(source->timeZone(), "Europe/Zurich");
+
+    writeFile(etc / "locale.conf", "LANG=it_CH.UTF-8\nLANGUAGE=it:rm\n# the same\n");
+    writeFile(etc / "unrelated", "LANG=ja_JP.UTF-8\n");
+    fs::remove(etc / "locale.conf");
+    EXPECT_TRUE(runUntil(loop, [&] { return source->locale().identifier == "de_DE"; })) << "the environment again";
+    EXPECT_EQ(locales, 2);
+}
+
+TEST_F(SystemLocale, TimeZoneComesFromTheFirstThatHasOne)
+{
+    const auto source = make();
+    EXPECT_EQ(source->timeZone(), "UTC");
+    writeFile(etc / "timezone", "Asia/Tokyo\n");
+    EXPECT_EQ(source->timeZone(), "Asia/Tokyo");
+    writeFile(etc / "localtime", "TZif2");
+    EXPECT_EQ(source->timeZone(), "Asia/Tokyo") << "a copy has no name";
+    fs::remove(etc / "localtime");
+    fs::create_symlink("../usr/share/zoneinfo/America/Argentina/Ushuaia", etc / "localtime");
+    EXPECT_EQ(source->timeZone(), "America/Argentina/Ushuaia");
+    const std::pair<const char*, const char*> variables[]{{"Europe/Rome", "Europe/Rome"},
+                                                          {":Europe/Rome", "Europe/Rome"},
+                                                          {"/usr/share/zoneinfo/Europe/Rome", "Europe/Rome"},
+                                                          {":/usr/share/zoneinfo/Europe/Rome", "Europe/Rome"},
+                                                          {"", "America/Argentina/Ushuaia"}};
+    for (const auto& [variable, zone] : variables) {
+        setenv("TZ", variable, 1);
+        EXPECT_EQ(source->timeZone(), zone) << variable;
+    }
+}
+
+TEST_F(SystemLocale, KeyboardIsTheFirstLayout)
+{
+    setenv("LANG", "de_CH.UTF-8", 1);
+    const auto source = make();
+    EXPECT_EQ(source->keyboardInputMode(), "");
+    const std::pair<const char*, const char*> files[]{{"XKBLAYOUT=\"ch,us\"\nXKBVARIANT=fr\n", "de_CH@layout=ch"},
+                                                      {"XKBMODEL=pc105\nXKBLAYOUT=us", "de_CH@layout=us"},
+                                                      {"XKBLAYOUT=\"\"\n", ""},
+                                                      {"XKBLAYOUT=,us\n", ""},
+                                                      {"XKBLAYOUTS=us\n", ""}};
+    for (const auto& [file, mode] : files) {
+        writeFile(etc / "default/keyboard", file);
+        EXPECT_EQ(source->keyboardInputMode(), mode) << file;
+    }
+    EXPECT_EQ(source->defaultInputMode(), "de_CH@layout=default");
+}
+
+} // namespace
+} // namespace platform
