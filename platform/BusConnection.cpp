@@ -219,12 +219,22 @@ void BusConnection::drive(bool writable)
         settleWriteQueue(kMessageOverhead);
         if (_state == State::Draining && _unwritten.empty()) return close();
         if (result == 0) {
-            if (_timer != 0 && _state == State::Open && sd_bus_is_ready(_bus.get()) > 0) cancelTimer();
+            if (_state == State::Open && sd_bus_is_ready(_bus.get()) > 0) {
+                cancelTimer();
+                _readsExactly = true;
+            }
             return updateWatch();
         }
+        if (_readsExactly && _parked.empty() && !hasQueuedRead()) return updateWatch();
     }
     // What is left may be in sd-bus's buffer, where no event tells of it.
     driveAgainLater();
+}
+
+bool BusConnection::hasQueuedRead() const
+{
+    std::uint64_t queued = 0;
+    return sd_bus_get_n_queued_read(_bus.get(), &queued) < 0 || queued > 0;
 }
 
 void BusConnection::driveAgainLater()

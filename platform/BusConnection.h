@@ -82,6 +82,7 @@ private:
     void ready(std::uint32_t events);
     void drive(bool writable);
     void driveAgainLater();
+    [[nodiscard]] bool hasQueuedRead() const;
     int onMessage(sd_bus_message* message);
     void receive(sd_bus_message* message, const Member& member);
     void dispatch(Call call);
@@ -124,6 +125,9 @@ private:
     std::uint32_t _watchedEvents = 0;
     bool _peerGone = false;
     bool _driveQueued = false;
+    /// Past the authentication, whose reading may run into the messages behind it, sd-bus reads message by message: what
+    /// it hasn't taken is in the socket, whose event tells of it.
+    bool _readsExactly = false;
     Clock::TimerId _timer = 0;
 
     std::unordered_map<std::uint64_t, PendingCall> _calls;

@@ -56,8 +56,6 @@ struct RunLoop::Impl {
 
     void runJobs()
     {
-        std::uint64_t count = 0;
-        if (read(wakeFd.fd(), &count, sizeof count) < 0) return;
         std::vector<Job> ready;
         {
             std::lock_guard lock(mutex);
@@ -71,7 +69,8 @@ RunLoop::RunLoop() : _impl(std::make_unique<Impl>())
 {
     if (sd_event_new(&_impl->event) < 0) std::abort(); // no epoll: nothing can run
     _impl->wakeFd = FileHandle(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK));
-    _impl->wakeWatch = watch(_impl->wakeFd.fd(), EPOLLIN, [this](std::uint32_t) { _impl->runJobs(); });
+    // Edge-triggered: every write wakes the loop, and the counter needs no reading.
+    _impl->wakeWatch = watch(_impl->wakeFd.fd(), EPOLLIN | EPOLLET, [this](std::uint32_t) { _impl->runJobs(); });
 }
 
 RunLoop::~RunLoop()
