@@ -1,0 +1,287 @@
+#include <algorithm>
+#include <array>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+#include <regex>
+#include <set>
+
+#include <gmock/gmock.h>
+
+#include "CoreTavrin/TAVFeedback.h"
+#include "CoreTavrin/TAVRecordClasses.h"
+#include "CoreTavrin/TAVRequest.h"
+#include "tavrind/TavrinFeedback.h"
+#include "tavrind/TavrinSessionFeedback.h"
+#include "tests/records/RecordFilling.h"
+
+namespace tavrin {
+namespace {
+
+using platform::recordFromValue;
+using platform::toValue;
+using platform::unarchive;
+using testing::ElementsAre;
+using testing::StartsWith;
+
+const platform::RecordClasses& all()
+{
+    return tavrindRecordClasses();
+}
+
+/// The record in a dictionary, by way of each coder.
+std::array<platform::Result<std::shared_ptr<platform::Record>>, 2> decodedBothWays(const Value& dictionary)
+{
+    return {recordFromValue(dictionary, all()), unarchive(platform::archive(LooseRecord(dictionary)), all())};
+}
+
+Value with(const platform::Record& record, const std::string& field, Value value)
+{
+    Dictionary dictionary{{"class", record.className()}};
+    dictionary.set(field, std::move(value));
+    return dictionary;
+}
+
+bool holdsRecords(const Value& given)
+{
+    return !given["class"].isNull() || !given[0]["class"].isNull();
+}
+
+/// `record`, in an array if the field holds arrays of records.
+Value inTheFormOf(const Value& given, Value record)
+{
+    return given.asArray() ? Value(Value::Array{std::move(record)}) : record;
+}
+
+/// Calls `body` with a record of every class, all of its fields set, and with what they were set to.
+template <class Body> void forEveryClass(Body body)
+{
+    for (const auto& [name, make] : all()) {
+        SCOPED_TRACE(name);
+        const auto record = make();
+        body(*record, fill(*record, all()));
+    }
+}
+
+std::set<std::string> classesDeclaredIn(const std::string& folder)
+{
+    static const std::regex kDeclaration("kClass = \"(\\w+)\"");
+    std::set<std::string> names;
+    for (const auto& entry : std::filesystem::directory_iterator(std::filesystem::path(SOURCE_DIR) / folder)) {
+        if (entry.path().extension() != ".h") continue;
+        std::ifstream stream(entry.path());
+        const std::string text(std::istreambuf_iterator<char>(stream), {});
+        for (std::sregex_iterator match(text.begin(), text.end(), kDeclaration), end; match != end; ++match)
+            names.insert((*match)[1]);
+    }
+    return names;
+}
+
+TEST(RecordClasses, EveryDeclaredRecordIsRegisteredUnderItsName)
+{
+    std::set<std::string> client;
+    for (const char* folder : {"searchrecords", "CoreTavrin"}) client.merge(classesDeclaredIn(folder));
+    std::set<std::string> daemon = classesDeclaredIn("tavrind");
+    EXPECT_TRUE(client.contains("ZRFeedback") && daemon.contains("TavrinFeedback"));
+    daemon.insert(client.begin(), client.end());
+    const auto expectRegistered = [](const platform::RecordClasses& classes, const std::set<std::string>& declared) {
+        std::set<std::string> registered;
+        for (const auto& [name, make] : classes) {
+            registered.emplace(name);
+            EXPECT_EQ(make()->className(), name);
+        }
+        EXPECT_EQ(registered, declared);
+    };
+    expectRegistered(coreRecordClasses(), client);
+    expectRegistered(all(), daemon);
+}
+
+TEST(RecordClasses, EveryFieldSurvivesBothCodersUnderANameOfItsOwn)
+{
+    forEveryClass([](const platform::Record& record, const auto& given) {
+        const Value value = toValue(record);
+        EXPECT_EQ(value.count(), record.fieldCount() + 1);
+        EXPECT_EQ(given.size(), record.fieldCount());
+        for (const auto& [field, expected] : given) EXPECT_EQ(value[field], expected) << field;
+        for (const auto& decoded : {recordFromValue(value, all()), unarchive(platform::archive(record), all())}) {
+            ASSERT_TRUE(decoded) << decoded.error().description();
+            EXPECT_EQ((*decoded)->className(), record.className());
+            EXPECT_EQ(toValue(**decoded), value);
+            EXPECT_EQ(platform::archive(**decoded), platform::archive(record));
+        }
+    });
+}
+
+TEST(RecordClasses, MissingFieldsAreZero)
+{
+    forEveryClass([](const platform::Record& record, const auto&) {
+        for (const auto& decoded : decodedBothWays(Dictionary{{"class", record.className()}})) {
+            ASSERT_TRUE(decoded) << decoded.error().description();
+            const Value read = toValue(**decoded);
+            for (const auto& [field, value] : *read.asDictionary()) {
+                if (field == "class") continue;
+                EXPECT_TRUE(value == Value(false) || value == Value(0) || value == Value(0.0) || value == Value("") ||
+                            value == Value(Bytes()))
+                    << field << ": " << platform::toJson(value);
+            }
+        }
+    });
+}
+
+TEST(RecordClasses, UnknownFieldsAreSkipped)
+{
+    forEveryClass([](const platform::Record& record, const auto&) {
+        const Value value = toValue(record);
+        Dictionary later{{"class", record.className()}, {"newRecord", Dictionary{{"class", "ZRLater"}, {"x", 1}}}};
+        for (const auto& [field, entry] : *value.asDictionary()) {
+            later.set(field, entry);
+            later.set("new " + field, Value::Array{nullptr, entry, Value::Array{Bytes("x"), -1}});
+        }
+        for (const auto& decoded : decodedBothWays(later)) {
+            ASSERT_TRUE(decoded) << decoded.error().description();
+            EXPECT_EQ(toValue(**decoded), value);
+        }
+    });
+}
+
+TEST(RecordClasses, WrongTypesAreErrorsThatNameTheField)
+{
+    const std::vector<Value> probes{true,
+                                    7,
+                                    2.5,
+                                    "https://example.com/",
+                                    Bytes("bytes"),
+                                    Value::Array{"text"},
+                                    Value::Array{3},
+                                    Dictionary{{"domain", "D"}, {"code", 1}}};
+    forEveryClass([&](const platform::Record& record, const auto& given) {
+        for (const auto& [field, value] : given) {
+            std::size_t taken = 0;
+            for (const Value& probe : probes) {
+                SCOPED_TRACE(field + ": " + platform::toJson(probe));
+                const auto decoded = decodedBothWays(with(record, field, probe));
+                EXPECT_EQ(decoded[0].has_value(), decoded[1].has_value());
+                for (const auto& each : decoded) {
+                    if (!each) {
+                        EXPECT_THAT(each.error().reason(), StartsWith(field));
+                        EXPECT_EQ(each.error().code, platform::kFormatMalformed);
+                        continue;
+                    }
+                    const Value read = toValue(**each)[field];
+                    EXPECT_TRUE(read == probe || read.asDouble() == probe.asDouble()) << platform::toJson(read);
+                }
+                taken += decoded[0].has_value();
+            }
+            // Of one type, or whole numbers for real ones; only a field of type Value takes everything.
+            EXPECT_TRUE(taken <= 2 || taken == probes.size()) << field << " takes " << taken;
+        }
+    });
+}
+
+TEST(RecordClasses, FieldsRefuseRecordsOfOtherClasses)
+{
+    EXPECT_EQ(recordFromValue(Dictionary{{"class", "ZRLater"}}, all()).error().code, platform::kFormatUnknownClass);
+    std::size_t fields = 0;
+    forEveryClass([&](const platform::Record& record, const auto& given) {
+        for (const auto& [field, value] : given) {
+            if (!holdsRecords(value)) continue;
+            ++fields;
+            const Value unknown = with(record, field, inTheFormOf(value, Dictionary{{"class", "ZRLater"}}));
+            for (const auto& decoded : decodedBothWays(unknown)) {
+                ASSERT_FALSE(decoded) << field;
+                EXPECT_EQ(decoded.error().code, platform::kFormatUnknownClass);
+                EXPECT_THAT(decoded.error().reason(), StartsWith(field));
+            }
+            if (field == "customProperties") continue; // holds records of any class
+            const Value other =
+                with(record, field, inTheFormOf(value, Dictionary{{"class", "TAVSessionConfiguration"}}));
+            for (const auto& decoded : decodedBothWays(other)) {
+                ASSERT_FALSE(decoded) << field;
+                EXPECT_THAT(decoded.error().reason(), testing::EndsWith("unexpected class TAVSessionConfiguration"));
+            }
+        }
+    });
+    EXPECT_GT(fields, 20u);
+}
+
+TEST(RecordClasses, FieldsKeepWhatSubclassesAdd)
+{
+    struct {
+        const char* owner;
+        const char* field;
+        Value record;
+        bool inArray;
+    } const cases[] = {
+        {"ZRCardSectionEngagementFeedback", "destination",
+         Dictionary{{"class", "TAVPunchout"}, {"actionTarget", "buy"}}, false},
+        {"ZRCardSectionEngagementFeedback", "cardSection", Dictionary{{"class", "ZRDescriptionCardSection"}}, false},
+        {"ZRSearchResult", "customProperties", Dictionary{{"class", "TAVCustomSearchResult"}, {"fbr", "note"}}, false},
+        {"ZRVisibleSuggestionsFeedback", "suggestions", Dictionary{{"class", "TAVSearchSuggestion"}, {"fbr", "note"}},
+         true},
+        {"TavrinFeedback", "feedback", Dictionary{{"class", "TAVRankerFeedback"}, {"resultCount", 5}}, false},
+        {"TavrinFeedback", "feedback", Dictionary{{"class", "TavrinConnectionInvalidated"}}, false},
+    };
+    for (const auto& c : cases) {
+        const auto owner = all().make(c.owner);
+        const Value value = with(*owner, c.field, c.inArray ? Value(Value::Array{c.record}) : c.record);
+        for (const auto& decoded : decodedBothWays(value)) {
+            ASSERT_TRUE(decoded) << decoded.error().description();
+            const Value read = toValue(**decoded)[c.field];
+            const Value& nested = c.inArray ? read[0] : read;
+            for (const auto& [name, expected] : *c.record.asDictionary()) EXPECT_EQ(nested[name], expected) << c.field;
+        }
+    }
+}
+
+TEST(RecordClasses, NumbersBeyondAnEnumerationAreKept)
+{
+    for (const std::int64_t number : {std::int64_t{999}, INT64_MIN}) {
+        for (const auto& decoded : decodedBothWays(Dictionary{{"class", "ZRSearchResult"}, {"type", number}})) {
+            ASSERT_TRUE(decoded) << decoded.error().description();
+            EXPECT_EQ(toValue(**decoded)["type"], Value(number));
+        }
+    }
+}
+
+TEST(RecordClasses, AUrlThatIsTakenCanBeReadAgain)
+{
+    for (const std::size_t length : {1'000u, 21'000u, 30'000u}) {
+        std::string url = "https://example.com/";
+        for (std::size_t i = 0; i < length; ++i) url += ' '; // three characters each, once encoded
+        const auto record = recordFromValue(Dictionary{{"class", "TAVCardRequest"}, {"cardURL", url}}, all());
+        EXPECT_EQ(record.has_value(), length < 30'000u);
+        if (record) {
+            EXPECT_TRUE(unarchive(platform::archive(**record), all()));
+        }
+    }
+}
+
+// Session files of every version have these names.
+TEST(RecordClasses, SessionFilesHaveTheirOwnNames)
+{
+    EXPECT_THAT(FieldNames::of(TavrinFeedback()),
+                ElementsAre("feedback", "query_id", "timestamp", "user_guid", "user_agent", "_clientQueryId"));
+    EXPECT_THAT(FieldNames::of(TavrinSessionEndFeedback()), ElementsAre("timestamp", "reason"));
+    EXPECT_THAT(FieldNames::of(TavrinSessionMissingResults()), ElementsAre("timestamp", "results"));
+    EXPECT_THAT(FieldNames::of(TavrinSessionMissingSuggestions()), ElementsAre("timestamp", "suggestions"));
+    EXPECT_THAT(FieldNames::of(TavrinConnectionInvalidated()), ElementsAre("timestamp"));
+}
+
+TEST(RecordClasses, EndsNameTheirStartAndStartsAreToldApart)
+{
+    const ZREndNetworkSearchFeedback none(nullptr, 10, 200, {});
+    EXPECT_EQ(none.uuid, "");
+    const auto start = std::make_shared<ZRStartNetworkSearchFeedback>(
+        "a", "https://example.com/", Value(), StartSearchTrigger::Warm, EndpointType::TavrinWarm);
+    const ZRStartNetworkSearchFeedback other("a", "https://example.com/", Value(), StartSearchTrigger::Warm,
+                                             EndpointType::TavrinWarm);
+    EXPECT_TRUE(platform::Uuid::parse(start->uuid));
+    EXPECT_NE(start->uuid, other.uuid);
+    const TAVEndNetworkSearchFeedback end(start, 10, 304, "OK", 0.5, "fbq", "10.0.0", Value());
+    EXPECT_EQ(end.uuid, start->uuid);
+    EXPECT_EQ(end.responseSize, 10);
+    EXPECT_EQ(end.statusCode, 304);
+}
+
+} // namespace
+} // namespace tavrin

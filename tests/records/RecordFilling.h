@@ -1,0 +1,157 @@
+#pragma once
+
+#include <map>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "platform/Record.h"
+
+/// Help for tests that hold for every record class: they work on a record's own list of fields.
+namespace tavrin {
+
+using platform::Bytes;
+using platform::Date;
+using platform::Dictionary;
+using platform::Value;
+
+/// The names of a record's fields, in their order.
+class FieldNames final : public platform::Encoder {
+public:
+    static std::vector<std::string> of(const platform::Record& record)
+    {
+        FieldNames encoder;
+        record.encodeFields(encoder);
+        return encoder._names;
+    }
+
+private:
+    void beginRecord(std::string_view, std::size_t) override {}
+    void key(std::string_view name) override { _names.emplace_back(name); }
+    void endRecord() override {}
+    void beginArray(std::size_t) override {}
+    void endArray() override {}
+    void null() override {}
+    void boolean(bool) override {}
+    void integer(std::int64_t) override {}
+    void unsignedInteger(std::uint64_t) override {}
+    void real(double) override {}
+    void string(std::string_view) override {}
+    void bytes(const Bytes&) override {}
+    void date(Date) override {}
+    void value(const Value&) override {}
+
+    std::vector<std::string> _names;
+};
+
+/// Reads one field from nowhere: each read answers a value that differs from zero and from those before. A field that
+/// holds records gets new ones of class `nested`.
+class Filler final : public platform::Decoder {
+public:
+    Filler(const platform::RecordClasses& classes, std::string nested, int& number)
+        : Decoder(classes), _nested(std::move(nested)), _number(number)
+    {}
+
+    /// What the field was given, as `toValue` has it.
+    [[nodiscard]] const Value& given() const { return _given; }
+
+    bool null() override { return false; }
+    bool boolean() override { return put(true), true; }
+    std::int64_t integer() override { return put(++_number), _number; }
+    std::uint64_t unsignedInteger() override { return put(++_number), static_cast<std::uint64_t>(_number); }
+    double real() override { return put(++_number + 0.5), _number + 0.5; }
+    std::string string() override
+    {
+        // A text that is a URL fits fields of either type.
+        std::string text = "https://example.com/" + std::to_string(++_number);
+        put(text);
+        return text;
+    }
+    Bytes bytes() override
+    {
+        Bytes run(std::string("\0bytes ", 7) + std::to_string(++_number));
+        put(run);
+        return run;
+    }
+    Date date() override
+    {
+        const Date moment = platform::dateFromSecondsSince1970(++_number);
+        put(moment);
+        return moment;
+    }
+    Value value() override
+    {
+        // A dictionary that fits a field of type Error, too.
+        const Value any = Dictionary{{"domain", "D"},
+                                     {"code", ++_number},
+                                     {"userInfo", Dictionary{{"reason", "why"}, {"list", Value::Array{1, "x", true}}}}};
+        put(any);
+        return any;
+    }
+    void skip() override {}
+    std::string beginRecord() override
+    {
+        const auto record = classes().make(_nested);
+        put(record ? platform::toValue(*record) : Value());
+        return _nested;
+    }
+    bool nextKey(std::string_view&) override { return false; }
+    std::size_t beginArray() override
+    {
+        _given = Value::Array();
+        return _left = 2;
+    }
+    bool nextElement() override { return _left-- > 0; }
+
+private:
+    void put(Value value)
+    {
+        if (_given.asArray())
+            _given.mutableArray().push_back(std::move(value));
+        else
+            _given = std::move(value);
+    }
+
+    const std::string _nested;
+    int& _number;
+    int _left = 0;
+    Value _given;
+};
+
+/// Sets every field of a record, and answers what each was given. Fields that hold records get the first class that
+/// they take; a field that takes nothing is missing in the answer.
+inline std::map<std::string, Value> fill(platform::Record& record, const platform::RecordClasses& classes)
+{
+    std::map<std::string, Value> given;
+    int number = 0;
+    for (const std::string& name : FieldNames::of(record)) {
+        for (const auto& [nested, factory] : classes) {
+            Filler filler(classes, std::string(nested), number);
+            if (!record.decodeField(name, filler) || filler.failed()) continue;
+            given[name] = filler.given();
+            break;
+        }
+    }
+    return given;
+}
+
+/// A record of whatever class and fields a dictionary names, for archives that no record of ours would write.
+class LooseRecord final : public platform::Record {
+public:
+    explicit LooseRecord(const Value& dictionary) : _dictionary(*dictionary.asDictionary()) {}
+    [[nodiscard]] std::string_view className() const override { return *_dictionary.find("class")->asString(); }
+    [[nodiscard]] std::size_t fieldCount() const override { return _dictionary.size() - 1; }
+    void encodeFields(platform::Encoder& encoder) const override
+    {
+        for (const auto& [name, value] : _dictionary) {
+            if (name == "class") continue;
+            encoder.key(name);
+            encoder.value(value);
+        }
+    }
+
+private:
+    const Dictionary _dictionary;
+};
+
+} // namespace tavrin
