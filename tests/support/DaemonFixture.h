@@ -53,6 +53,8 @@ struct DaemonTest : testing::Test {
     {
         do device.drain();
         while (device.loader.cancelAll());
+        device.ipc.endAll();
+        device.drain();
     }
 
     void start()

@@ -300,9 +300,22 @@ std::shared_ptr<FakeConnection> FakeTransport::connect(std::string_view interfac
     if (!acceptor) return nullptr;
     auto queue = Queue::make(endpoint->label, Queue::Kind::Serial, _executor, _clock);
     auto connection = std::make_shared<FakeConnection>(endpoint->interface, peer, std::move(queue));
+    {
+        std::lock_guard lock(_mutex);
+        _connections.push_back(connection);
+    }
     // As with the real one, letting go of what the acceptor gets ends the connection.
     acceptor(std::shared_ptr<ipc::Connection>(connection.get(), [connection](ipc::Connection*) { connection->invalidate(); }));
     return connection;
+}
+
+void FakeTransport::endAll()
+{
+    std::unique_lock lock(_mutex);
+    const auto connections = std::exchange(_connections, {});
+    lock.unlock();
+    for (const auto& connection : connections)
+        if (const auto living = connection.lock()) living->end();
 }
 
 void FakeTransport::failNextListen(Error error)

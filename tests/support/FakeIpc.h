@@ -101,6 +101,8 @@ public:
     /// A connection to the newest living listener of that interface or address, already handed to its acceptor on this
     /// thread; null where there is no such listener or it doesn't accept yet.
     std::shared_ptr<FakeConnection> connect(std::string_view interfaceOrAddress, ipc::Peer peer = {1, 0});
+    /// All peers go away.
+    void endAll();
     /// Makes the next `listen` fail.
     void failNextListen(Error error);
 
@@ -118,6 +120,7 @@ private:
     Clock& _clock;
     std::mutex _mutex;
     std::vector<std::weak_ptr<Endpoint>> _endpoints;
+    std::vector<std::weak_ptr<FakeConnection>> _connections;
     std::optional<Error> _listenFailure;
 };
 
