@@ -3,6 +3,8 @@
 #include <algorithm>
 #include <csignal>
 #include <fcntl.h>
+#include <map>
+#include <optional>
 #include <sys/resource.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -134,17 +136,43 @@ TEST_F(FilesTest, TellsWhatThereIs)
     EXPECT_EQ(failure(files->remove(directory / "link")), ENOENT);
 }
 
+/// Sets or unsets variables, and puts them back.
+class Environment {
+public:
+    explicit Environment(const std::map<std::string, const char*>& variables)
+    {
+        for (const auto& [name, value] : variables) {
+            const char* before = getenv(name.c_str());
+            _before[name] = before ? std::optional<std::string>(before) : std::nullopt;
+            put(name, value);
+        }
+    }
+    ~Environment()
+    {
+        for (const auto& [name, value] : _before) put(name, value ? value->c_str() : nullptr);
+    }
+
+private:
+    static void put(const std::string& name, const char* value)
+    {
+        if (value)
+            setenv(name.c_str(), value, 1);
+        else
+            unsetenv(name.c_str());
+    }
+    std::map<std::string, std::optional<std::string>> _before;
+};
+
 TEST(Directories, RelativeOrMissingVariablesCountAsUnset)
 {
-    setenv("HOME", "/home/me", 1);
-    setenv("XDG_CACHE_HOME", "/elsewhere", 1);
-    setenv("XDG_CONFIG_HOME", "relative/config", 1);
-    setenv("XDG_STATE_HOME", "", 1);
-    unsetenv("XDG_DATA_HOME");
-    setenv("TMPDIR", "/tmp/mine", 1);
-    unsetenv("XDG_RUNTIME_DIR");
+    const Environment environment({{"HOME", "/home/me"},
+                                   {"XDG_CACHE_HOME", "/elsewhere"},
+                                   {"XDG_CONFIG_HOME", "relative/config"},
+                                   {"XDG_STATE_HOME", ""},
+                                   {"XDG_DATA_HOME", nullptr},
+                                   {"TMPDIR", "/tmp/mine"},
+                                   {"XDG_RUNTIME_DIR", nullptr}});
     const Directories found = Directories::fromEnvironment();
-    unsetenv("TMPDIR");
     EXPECT_EQ(found.caches, "/elsewhere");
     EXPECT_EQ(found.config, "/home/me/.config");
     EXPECT_EQ(found.state, "/home/me/.local/state");

@@ -20,6 +20,7 @@ using test::writeFile;
 
 struct UserDefaultsTest : testing::Test {
     static void SetUpTestSuite() { Log::threshold = LogLevel::Fault; } // what is expected is captured, not printed
+    ~UserDefaultsTest() override { executor.drain(); } // a write that waits holds its queue
 
     std::string text(const fs::path& file) const
     {
