@@ -48,7 +48,7 @@ private:
 /// holds records gets new ones of class `nested`.
 class Filler final : public platform::Decoder {
 public:
-    Filler(const platform::RecordClasses& classes, std::string nested, int& number)
+    Filler(const platform::RecordClasses& classes, std::string nested, std::int64_t& number)
         : Decoder(classes), _nested(std::move(nested)), _number(number)
     {}
 
@@ -59,7 +59,7 @@ public:
     bool boolean() override { return put(true), true; }
     std::int64_t integer() override { return put(++_number), _number; }
     std::uint64_t unsignedInteger() override { return put(++_number), static_cast<std::uint64_t>(_number); }
-    double real() override { return put(++_number + 0.5), _number + 0.5; }
+    double real() override { return put(static_cast<double>(++_number) + 0.5), static_cast<double>(_number) + 0.5; }
     std::string string() override
     {
         // A text that is a URL fits fields of either type.
@@ -75,7 +75,7 @@ public:
     }
     Date date() override
     {
-        const Date moment = platform::dateFromSecondsSince1970(++_number);
+        const Date moment = platform::dateFromSecondsSince1970(static_cast<double>(++_number));
         put(moment);
         return moment;
     }
@@ -113,7 +113,7 @@ private:
     }
 
     const std::string _nested;
-    int& _number;
+    std::int64_t& _number;
     int _left = 0;
     Value _given;
 };
@@ -123,7 +123,7 @@ private:
 inline std::map<std::string, Value> fill(platform::Record& record, const platform::RecordClasses& classes)
 {
     std::map<std::string, Value> given;
-    int number = 0;
+    std::int64_t number = 5'000'000'000; // more than 32 bits
     for (const std::string& name : FieldNames::of(record)) {
         for (const auto& [nested, factory] : classes) {
             Filler filler(classes, std::string(nested), number);
