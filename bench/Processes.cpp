@@ -135,11 +135,11 @@ std::vector<Row> waiters()
 
 std::vector<Row> idle()
 {
-    std::fprintf(stderr, "idle: 60 s\n");
     const Service service(1000);
     const Daemon daemon(service.url("/bag"));
     const auto client = daemon.client();
-    pass(15); // connections are dropped after 10 s without use
+    std::fprintf(stderr, "idle: first 75 s for connections to be dropped and counters to be saved\n");
+    pass(75);
     const std::uint64_t before = contextSwitches(daemon.pid());
     pass(60);
     const auto wakeUps = static_cast<double>(contextSwitches(daemon.pid()) - before);
