@@ -17,7 +17,7 @@ namespace tavrin::ctl {
 using Command = std::function<void(const Options&)>;
 
 void addSearchCommand(CLI::App& app, Command& chosen);
-/// zkw, more, card, lookup and flight.
+/// zkw, more, card, lookup, flight and warm.
 void addOtherRequestCommands(CLI::App& app, Command& chosen);
 /// bag, sessions, status and stats.
 void addInspectCommands(CLI::App& app, Command& chosen);

@@ -1,9 +1,10 @@
-// tavrinctl zkw, more, card, lookup, flight.
+// tavrinctl zkw, more, card, lookup, flight, warm.
 
 #include <CLI/CLI.hpp>
 #include <fmt/format.h>
 
 #include "CoreTavrin/TAVRequest.h"
+#include "searchrecords/ZRViewFeedback.h"
 #include "tools/tavrinctl/Commands.h"
 #include "tools/tavrinctl/RequestRunner.h"
 
@@ -78,10 +79,27 @@ CLI::App* add(CLI::App& app, const char* name, const char* description, const st
     return command;
 }
 
+/// As a client whose search view appears: the daemon opens the connection to the service, unless it is warm.
+void warm(const Options& options)
+{
+    const Session session = openSession(options);
+    ZRSearchViewAppearFeedback appeared;
+    appeared.viewAppearEvent = SearchViewAppearTrigger::KeyboardShortcut;
+    session.client->reportEvent("searchViewDidAppear", 0, appeared);
+    (void)valueOf(session.client->status()); // calls are taken in order: the event has been, by now
+    if (options.json) printJson(platform::Dictionary{{"reported", appeared.className()}});
+    else printLine("The search view has appeared; the daemon's log tells whether the connection was warm already.");
+}
+
 } // namespace
 
 void addOtherRequestCommands(CLI::App& app, Command& chosen)
 {
+    app.add_subcommand("warm", "Open the connection to the service ahead of a search")->callback([&chosen] {
+        chosen = warm;
+    });
+
+
     const auto onChosen = [&chosen](CLI::App* command, auto action) {
         command->callback(
             [&chosen, action] { chosen = [action](const Options& common) { finish(common, action(common)); }; });
