@@ -20,6 +20,7 @@
 #include "platform/Log.h"
 #include "platform/RunLoop.h"
 #include "tests/support/ManualClock.h"
+#include "tests/support/TemporaryDirectory.h"
 
 namespace platform::ipc {
 namespace {
@@ -57,13 +58,6 @@ const Member& method(std::string_view name)
     return *std::ranges::find(probe().methods, name, &Member::name);
 }
 
-/// A directory for one test, removed afterwards.
-struct TemporaryDirectory {
-    TemporaryDirectory() { path = mkdtemp(path.data()); }
-    ~TemporaryDirectory() { std::filesystem::remove_all(path); }
-    std::string path = "/tmp/ipc-test-XXXXXX";
-};
-
 /// A service with a probe object on every connection, its loop on a thread.
 class Service {
 public:
@@ -84,7 +78,7 @@ public:
         listener.reset();
     }
 
-    std::string directory() const { return _directory.path + "/service"; }
+    std::string directory() const { return (_directory / "service").string(); }
 
     void serve(Listener& on)
     {
@@ -166,7 +160,7 @@ private:
     }
 
     const Limits _limits;
-    TemporaryDirectory _directory;
+    test::TemporaryDirectory _directory;
     std::thread _thread;
 };
 
@@ -481,8 +475,8 @@ TEST(Ipc, AProcessShortOfDescriptorsAcceptsLater)
 
 TEST(ListenSocket, TakesOverFromTheDeadOnly)
 {
-    TemporaryDirectory temporary;
-    const std::filesystem::path directory = temporary.path + "/a/b";
+    test::TemporaryDirectory temporary;
+    const std::filesystem::path directory = temporary.path.string() + "/a/b";
     const auto path = directory / "socket";
     const auto errorOf = [&] { return ListenSocket::bindExclusive(path).error().code; };
     {
@@ -509,8 +503,8 @@ TEST(ListenSocket, TakesOverFromTheDeadOnly)
     }
     std::fclose(std::fopen(path.c_str(), "w"));
     EXPECT_EQ(errorOf(), EEXIST);
-    std::filesystem::create_directory_symlink(directory, temporary.path + "/link");
-    EXPECT_FALSE(preparePrivateDirectory(temporary.path + "/link"));
+    std::filesystem::create_directory_symlink(directory, temporary.path.string() + "/link");
+    EXPECT_FALSE(preparePrivateDirectory(temporary.path.string() + "/link"));
     EXPECT_EQ(busAddress("/run/a b%"), "unix:path=/run/a%20b%25");
 }
 
@@ -518,8 +512,8 @@ TEST(ListenSocket, ComesFromTheServiceManagerWhereThereIsOne)
 {
     testing::FLAGS_gtest_death_test_style = "threadsafe";
     const auto activated = [] {
-        TemporaryDirectory temporary;
-        auto passed = std::move(*ListenSocket::bindExclusive(temporary.path + "/managed"));
+        test::TemporaryDirectory temporary;
+        auto passed = std::move(*ListenSocket::bindExclusive(temporary.path.string() + "/managed"));
         dup2(passed.fd(), 3);
         setenv("LISTEN_PID", std::to_string(getpid()).c_str(), 1);
         setenv("LISTEN_FDS", "1", 1);

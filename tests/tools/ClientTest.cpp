@@ -1,6 +1,5 @@
 #include "CoreTavrin/TAVClient.h"
 
-#include <filesystem>
 #include <thread>
 
 #include <gmock/gmock.h>
@@ -17,6 +16,7 @@
 #include "searchrecords/ZRRecords.h"
 #include "searchrecords/ZRViewFeedback.h"
 #include "tests/support/ManualClock.h"
+#include "tests/support/TemporaryDirectory.h"
 
 namespace tavrin::test {
 namespace {
@@ -101,7 +101,7 @@ struct ClientTest : testing::Test {
     ClientTest()
     {
         platform::failOnReplyMisuse();
-        transport = platform::ipc::makeBusTransport(loop, pool, clock, directory);
+        transport = platform::ipc::makeBusTransport(loop, pool, clock, temporary / "service");
         endpoint = transport->anonymous(endpointInterface(), "test.endpoint");
         daemon->endpoint = endpoint->endpoint();
         endpoint->setAcceptor([this](auto connection) {
@@ -132,14 +132,8 @@ struct ClientTest : testing::Test {
         listener.reset();
         endpoint.reset();
         transport.reset();
-        std::filesystem::remove_all(directory);
     }
 
-    static std::string temporaryDirectory()
-    {
-        std::string path = "/tmp/client-test-XXXXXX";
-        return mkdtemp(path.data());
-    }
     TAVSearchRequest search(std::string query, std::int64_t queryId)
     {
         TAVSearchRequest request;
@@ -148,7 +142,7 @@ struct ClientTest : testing::Test {
         return request;
     }
 
-    const std::string directory = temporaryDirectory();
+    const platform::test::TemporaryDirectory temporary;
     platform::RunLoop loop;
     platform::WorkerPool pool{2};
     platform::test::ManualClock clock;
