@@ -119,8 +119,8 @@ double seconds(CURL* easy, CURLINFO info)
     return static_cast<double>(microseconds) / 1e6;
 }
 
-/// The name of the interface that has this address.
-std::string interfaceOf(const std::string& localIp)
+/// The name of the interface that has this address now.
+std::string readInterfaceOf(const std::string& localIp)
 {
     ifaddrs* list = nullptr;
     if (getifaddrs(&list) != 0) return {};
@@ -138,6 +138,20 @@ std::string interfaceOf(const std::string& localIp)
             return entry->ifa_name;
     }
     return {};
+}
+
+/// The same, as of 10 s ago at most: listing a device's interfaces takes longer than parsing an answer.
+std::string interfaceOf(const std::string& localIp)
+{
+    constexpr double kTrustedFor = 10;
+    thread_local std::string ip, name;
+    thread_local double read = 0;
+    if (const double now = monotonicSeconds(); localIp != ip || now - read > kTrustedFor) {
+        name = readInterfaceOf(localIp);
+        ip = localIp;
+        read = now;
+    }
+    return name;
 }
 
 } // namespace

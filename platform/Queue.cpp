@@ -97,6 +97,21 @@ struct Entry {
     bool barrier = false;
 };
 
+/// Drain jobs for the executor, submitted when this is destroyed at the latest: with the queue's mutex free, so that the worker
+/// that wakes doesn't run into it. Declared ahead of the lock.
+class Queue::Jobs {
+public:
+    explicit Jobs(Queue& queue) : _queue(queue) {}
+    ~Jobs() { submit(); }
+    Jobs(const Jobs&) = delete;
+    Jobs& operator=(const Jobs&) = delete;
+    void submit();
+    unsigned count = 0;
+
+private:
+    Queue& _queue;
+};
+
 /// A serial queue is a concurrent one whose every task is a barrier. What runs is counted in `shared` and `exclusive`; who
 /// ends a task calls `pump`, which gives the next place its turn: a waiting caller directly, a task through the first caller
 /// that waits behind it, or else through a job for the executor.
@@ -138,7 +153,7 @@ struct Queue::Core {
         return entry;
     }
 
-    void pump(Queue& queue)
+    void pump(Jobs& handedOver)
     {
         while (headMayStart() && entries.front().waiter) {
             SyncWaiter* waiter = take().waiter;
@@ -153,10 +168,7 @@ struct Queue::Core {
             if (kind == Kind::Serial) return;
         }
         const std::size_t wanted = kind == Kind::Serial ? 1 : std::min(entries.size() - waiters, kMaximumJobs);
-        while (jobs < wanted) {
-            ++jobs;
-            executor.execute(priority, [self = queue.shared_from_this()] { self->_core->drain(*self); });
-        }
+        for (; jobs < wanted; ++jobs) ++handedOver.count;
     }
 
     /// Runs a task with the mutex released; the task is destroyed before it is taken again.
@@ -176,11 +188,13 @@ struct Queue::Core {
     void drain(Queue& queue)
     {
         setThreadNameForLabel(label);
+        Jobs handedOver(queue);
         std::unique_lock lock(mutex);
         --jobs;
         for (unsigned i = 0; i < kBatch && headMayStart() && !entries.front().waiter; ++i) run(queue, take(), lock);
-        pump(queue);
+        pump(handedOver);
     }
+
 };
 
 std::shared_ptr<Queue> Queue::make(std::string label, Kind kind, Executor& executor, Clock& clock, Priority priority)
@@ -188,6 +202,13 @@ std::shared_ptr<Queue> Queue::make(std::string label, Kind kind, Executor& execu
     auto core = std::unique_ptr<Core>(
         new Core{.label = std::move(label), .kind = kind, .executor = executor, .clock = clock, .priority = priority});
     return std::shared_ptr<Queue>(new Queue(std::move(core)));
+}
+
+void Queue::Jobs::submit()
+{
+    for (; count > 0; --count)
+        _queue._core->executor.execute(_queue._core->priority,
+                                       [self = _queue.shared_from_this()] { self->_core->drain(*self); });
 }
 
 Queue::Queue(std::unique_ptr<Core> core) : _core(std::move(core)) {}
@@ -200,16 +221,18 @@ const std::string& Queue::label() const
 
 void Queue::async(Task task)
 {
+    Jobs handedOver(*this);
     std::lock_guard lock(_core->mutex);
     _core->entries.push_back({.task = std::move(task), .barrier = _core->kind == Kind::Serial});
-    _core->pump(*this);
+    _core->pump(handedOver);
 }
 
 void Queue::barrierAsync(Task task)
 {
+    Jobs handedOver(*this);
     std::lock_guard lock(_core->mutex);
     _core->entries.push_back({.task = std::move(task), .barrier = true});
-    _core->pump(*this);
+    _core->pump(handedOver);
 }
 
 void Queue::runSync(TaskRef task, bool barrier)
@@ -218,6 +241,7 @@ void Queue::runSync(TaskRef task, bool barrier)
     Core& core = *_core;
     barrier = barrier || core.kind == Kind::Serial;
 
+    Jobs handedOver(*this);
     std::unique_lock lock(core.mutex);
     if (core.entries.empty() && core.mayStart(barrier)) {
         core.begin(barrier);
@@ -232,7 +256,10 @@ void Queue::runSync(TaskRef task, bool barrier)
                 continue;
             }
             if (core.entries.front().waiter) {
-                core.pump(*this);
+                core.pump(handedOver);
+                lock.unlock();
+                handedOver.submit();
+                lock.lock();
                 continue;
             }
             core.run(*this, core.take(), lock);
@@ -245,7 +272,7 @@ void Queue::runSync(TaskRef task, bool barrier)
     }
     lock.lock();
     core.end(barrier);
-    core.pump(*this);
+    core.pump(handedOver);
 }
 
 void Queue::after(Duration delay, Task task)
@@ -264,11 +291,12 @@ void Queue::suspendUntil(const Event& event, Duration timeout, Task continuation
     suspension->resumeQueue = [](Suspension& over) {
         Core& core = *over.queue->_core;
         core.clock.cancel(over.timer);
+        Jobs handedOver(*over.queue);
         std::lock_guard lock(core.mutex);
         if (!std::ranges::all_of(core.suspensions, [](const auto& other) { return other->over.load(); })) return;
         for (const auto& ended : std::exchange(core.suspensions, {}) | std::views::reverse)
             core.entries.push_front({.task = std::move(ended->continuation), .barrier = true});
-        core.pump(*over.queue);
+        core.pump(handedOver);
     };
     {
         std::lock_guard lock(_core->mutex);

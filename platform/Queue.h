@@ -109,6 +109,7 @@ public:
 
 private:
     struct Core;
+    class Jobs;
     explicit Queue(std::unique_ptr<Core> core);
     void runSync(TaskRef task, bool barrier);
 

@@ -43,12 +43,17 @@ public:
 
     void add(Executor::Job job, bool urgent)
     {
-        std::lock_guard lock(_mutex);
-        if (_stopping) return;
-        if (urgent) _jobs.push_front(std::move(job));
-        else _jobs.push_back(std::move(job));
-        if (_idle > 0) _wake.notify_one();
-        else if (_threads.size() < _limit) _threads.emplace_back([this] { work(); });
+        bool someoneIdles = false;
+        {
+            std::lock_guard lock(_mutex);
+            if (_stopping) return;
+            if (urgent) _jobs.push_front(std::move(job));
+            else _jobs.push_back(std::move(job));
+            someoneIdles = _idle > 0;
+            if (!someoneIdles && _threads.size() < _limit) _threads.emplace_back([this] { work(); });
+        }
+        // Without the mutex, which the worker that wakes needs.
+        if (someoneIdles) _wake.notify_one();
     }
 
 private:
