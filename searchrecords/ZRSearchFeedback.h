@@ -15,8 +15,8 @@ struct ZRStartSearchFeedback : platform::RecordOf<ZRStartSearchFeedback, ZRFeedb
 
     std::optional<std::string> input; ///< what the user had typed
     StartSearchTrigger triggerEvent = StartSearchTrigger::Unknown;
-    std::string uuid;          ///< of this search; empty for none
-    std::uint64_t queryId = 0; ///< the client's own number for the query; 0 is none
+    std::optional<std::string> uuid; ///< of this search
+    std::uint64_t queryId = 0;       ///< the client's own number for the query; 0 is none
 
     static constexpr auto fields()
     {
@@ -28,7 +28,7 @@ struct ZRStartSearchFeedback : platform::RecordOf<ZRStartSearchFeedback, ZRFeedb
 
 struct ZREndSearchFeedback : platform::RecordOf<ZREndSearchFeedback, ZRFeedback> {
     static constexpr std::string_view kClass = "ZREndSearchFeedback";
-    std::string uuid; ///< of the search that ends; empty for none
+    std::optional<std::string> uuid; ///< of the search that ends
     static constexpr auto fields() { return std::tuple{platform::field("uuid", &ZREndSearchFeedback::uuid)}; }
 };
 

@@ -375,7 +375,7 @@ void ClientState::_cacheResponse(const Value& response, const Exchange& exchange
         const std::string* status = set["status"].asString();
         if (status && *status == "ERROR") continue;
         _queryCache->set(std::make_shared<const CachedResultSet>(
-            CachedResultSet{exchange.request->queryString, exchange.httpRequest, set, exchange.start->uuid}));
+            CachedResultSet{exchange.request->queryString, exchange.httpRequest, set, exchange.start->uuid.value_or("")}));
     }
 }
 

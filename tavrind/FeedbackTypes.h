@@ -49,8 +49,8 @@ enum class EventType : std::int64_t {
 [[nodiscard]] std::span<const std::string_view> eventTypes();
 [[nodiscard]] std::string_view eventTypeToString(EventType type);
 
-/// The event that a record reports: that of its class or, where its class has none of its own, of the nearest class
-/// that it extends. A custom record's follows from its feedback type.
+/// The event that a record reports: that of its class, which is listed for every class. A custom record's follows from
+/// its feedback type.
 [[nodiscard]] EventType eventType(const ZRFeedback& record);
 
 /// Whether events of a type, or of that record's, are uploaded with their query ids.

@@ -270,12 +270,12 @@ TEST(RecordClasses, SessionFilesHaveTheirOwnNames)
 TEST(RecordClasses, EndsNameTheirStartAndStartsAreToldApart)
 {
     const ZREndNetworkSearchFeedback none(nullptr, 10, 200, {});
-    EXPECT_EQ(none.uuid, "");
+    EXPECT_EQ(none.uuid, std::nullopt);
     const auto start = std::make_shared<ZRStartNetworkSearchFeedback>(
         "a", "https://example.com/", Value(), StartSearchTrigger::Warm, EndpointType::TavrinWarm);
     const ZRStartNetworkSearchFeedback other("a", "https://example.com/", Value(), StartSearchTrigger::Warm,
                                              EndpointType::TavrinWarm);
-    EXPECT_TRUE(platform::Uuid::parse(start->uuid));
+    EXPECT_TRUE(platform::Uuid::parse(start->uuid.value_or("")));
     EXPECT_NE(start->uuid, other.uuid);
     const TAVEndNetworkSearchFeedback end(start, 10, 304, "OK", 0.5, "fbq", "10.0.0", Value());
     EXPECT_EQ(end.uuid, start->uuid);
