@@ -111,25 +111,23 @@ void addOtherRequestCommands(CLI::App& app, Command& chosen)
         return run(common, *zkw, request);
     });
 
-    auto more = std::make_shared<RequestOptions>();
-    CLI::App* moreCommand = add(app, "more", "More results of a section", more);
-    moreCommand->add_option("what", more->what, "The URL in an earlier answer, or a query to search for first")
-        ->required();
-    moreCommand->add_flag("--endpoint", more->endpoint, "Ask over the endpoint, not the connection");
-    onChosen(moreCommand, [more](const Options& common) {
+    // Two that follow a URL of an earlier answer, and are served over the endpoint too.
+    const auto addFollowing = [&](const char* name, const char* description, auto follow) {
+        auto options = std::make_shared<RequestOptions>();
+        CLI::App* command = add(app, name, description, options);
+        command->add_option("what", options->what, "The URL in an earlier answer, or a query to search for first")->required();
+        command->add_flag("--endpoint", options->endpoint, "Ask over the endpoint, not the connection");
+        onChosen(command, [options, follow](const Options& common) { return follow(common, *options); });
+    };
+    addFollowing("more", "More results of a section", [](const Options& common, const RequestOptions& more) {
         TAVMoreResultsRequest request;
-        request.moreResultsURL = urlFor(common, more->what, "more_results_url");
-        return run(common, *more, request);
+        request.moreResultsURL = urlFor(common, more.what, "more_results_url");
+        return run(common, more, request);
     });
-
-    auto card = std::make_shared<RequestOptions>();
-    CLI::App* cardCommand = add(app, "card", "A result's card", card);
-    cardCommand->add_option("what", card->what, "The URL in a result, or a query to search for first")->required();
-    cardCommand->add_flag("--endpoint", card->endpoint, "Ask over the endpoint, not the connection");
-    onChosen(cardCommand, [card](const Options& common) {
+    addFollowing("card", "A result's card", [](const Options& common, const RequestOptions& card) {
         TAVCardRequest request;
-        request.cardURL = urlFor(common, card->what, "card_url");
-        return run(common, *card, request);
+        request.cardURL = urlFor(common, card.what, "card_url");
+        return run(common, card, request);
     });
 
     auto lookup = std::make_shared<RequestOptions>();
