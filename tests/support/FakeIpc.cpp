@@ -93,18 +93,11 @@ ipc::CallResult FakeCall::take()
     return *std::exchange(_result, std::nullopt);
 }
 
-void FakeCall::wait()
-{
-    std::unique_lock lock(_mutex);
-    _settled.wait(lock, [&] { return _state != State::Pending; });
-}
-
 void FakeCall::settle(State state, std::optional<ipc::CallResult> result)
 {
     std::lock_guard lock(_mutex);
     _state = state;
     _result = std::move(result);
-    _settled.notify_all();
 }
 
 FakeConnection::FakeConnection(const ipc::Interface& interface, ipc::Peer peer, std::shared_ptr<Queue> queue)
@@ -173,18 +166,6 @@ std::vector<FakePush> FakeConnection::takePushes()
     return std::exchange(_pushes, {});
 }
 
-std::size_t FakeConnection::pushCount() const
-{
-    std::lock_guard lock(_mutex);
-    return _pushes.size();
-}
-
-void FakeConnection::waitForPushes(std::size_t count)
-{
-    std::unique_lock lock(_mutex);
-    _pushed.wait(lock, [&] { return _pushes.size() >= count; });
-}
-
 bool FakeConnection::resumed() const
 {
     std::lock_guard lock(_mutex);
@@ -239,7 +220,6 @@ void FakeConnection::push(std::string_view signal, ipc::Message arguments)
         return;
     }
     _pushes.push_back({std::string(signal), std::move(arguments)});
-    _pushed.notify_all();
 }
 
 /// Shared by a listener, which its service owns, and the transport, which only knows it while that lives.
@@ -318,18 +298,8 @@ void FakeTransport::endAll()
         if (const auto living = connection.lock()) living->end();
 }
 
-void FakeTransport::failNextListen(Error error)
-{
-    std::lock_guard lock(_mutex);
-    _listenFailure = std::move(error);
-}
-
 Result<std::unique_ptr<ipc::Listener>> FakeTransport::listen(const ipc::Interface& interface, const std::string& label)
 {
-    {
-        std::lock_guard lock(_mutex);
-        if (_listenFailure) return std::unexpected(*std::exchange(_listenFailure, std::nullopt));
-    }
     return make(interface, label);
 }
 

@@ -1,7 +1,6 @@
 #pragma once
 
 #include <atomic>
-#include <condition_variable>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -28,14 +27,11 @@ public:
     [[nodiscard]] Value argument(std::size_t index) const;
     /// The whole answer, taken out; only once it is there.
     [[nodiscard]] ipc::CallResult take();
-    /// Blocks until the call is answered or abandoned: for tests that run a worker pool.
-    void wait();
 
 private:
     friend class FakeConnection;
     void settle(State state, std::optional<ipc::CallResult> result);
     mutable std::mutex _mutex;
-    std::condition_variable _settled;
     State _state = State::Pending;
     std::optional<ipc::CallResult> _result;
 };
@@ -59,9 +55,6 @@ public:
     void end();
     /// What was pushed so far, in order; it is taken out.
     [[nodiscard]] std::vector<FakePush> takePushes();
-    [[nodiscard]] std::size_t pushCount() const;
-    /// Blocks until `count` pushes have come since the last `takePushes`.
-    void waitForPushes(std::size_t count);
     [[nodiscard]] bool resumed() const;
     /// True once either side has ended the connection.
     [[nodiscard]] bool invalidated() const;
@@ -83,7 +76,6 @@ private:
     const ipc::Peer _peer;
     const std::shared_ptr<Queue> _queue;
     mutable std::mutex _mutex;
-    std::condition_variable _pushed;
     std::shared_ptr<ipc::Handler> _handler;
     std::move_only_function<void()> _invalidationHandler;
     std::function<void(const std::string&)> _pushErrorHandler;
@@ -103,8 +95,6 @@ public:
     std::shared_ptr<FakeConnection> connect(std::string_view interfaceOrAddress, ipc::Peer peer = {1, 0});
     /// All peers go away.
     void endAll();
-    /// Makes the next `listen` fail.
-    void failNextListen(Error error);
 
     [[nodiscard]] Result<std::unique_ptr<ipc::Listener>> listen(const ipc::Interface& interface,
                                                                 const std::string& label) override;
@@ -121,7 +111,6 @@ private:
     std::mutex _mutex;
     std::vector<std::weak_ptr<Endpoint>> _endpoints;
     std::vector<std::weak_ptr<FakeConnection>> _connections;
-    std::optional<Error> _listenFailure;
 };
 
 /// Why `message` can't travel under a D-Bus signature; nothing if it can.
