@@ -10,6 +10,8 @@
 
 namespace platform {
 
+class ActivityScheduler;
+class BackgroundSessions;
 class Clock;
 class CounterStore;
 class DeviceProfileSource;
@@ -56,6 +58,8 @@ struct Device {
     ProcessIdentity& processes;
     SystemNotifier& systemNotifier;
     UrlLoader& urlLoader;
+    BackgroundSessions& backgroundSessions;
+    ActivityScheduler& activities;
     ipc::Transport& ipc;
     std::vector<std::string> launchEvents{}; ///< names of what the service manager started the process for
 

@@ -6,7 +6,9 @@
 #include <dirent.h>
 #include <fcntl.h>
 #include <pwd.h>
+#include <span>
 #include <sys/stat.h>
+#include <sys/uio.h>
 #include <unistd.h>
 
 #include <fmt/format.h>
@@ -73,6 +75,45 @@ void syncDirectory(const fs::path& directory)
     FileHandle handle(open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
     if (handle) fsync(handle.fd());
 }
+
+class SystemAppendFile final : public AppendFile {
+public:
+    explicit SystemAppendFile(FileHandle file) : _file(std::move(file)) {}
+
+    Result<std::uint64_t> size() override
+    {
+        struct stat status {};
+        if (fstat(_file.fd(), &status) != 0) return std::unexpected(Error::posix(errno));
+        return static_cast<std::uint64_t>(status.st_size);
+    }
+
+    Result<void> append(std::initializer_list<std::string_view> parts) override
+    {
+        const auto before = size();
+        if (!before) return std::unexpected(before.error());
+        std::vector<iovec> rest;
+        for (const std::string_view part : parts) rest.push_back({const_cast<char*>(part.data()), part.size()});
+        for (std::span<iovec> left = rest; !left.empty();) {
+            const ssize_t written =
+                retried([&] { return writev(_file.fd(), left.data(), static_cast<int>(left.size())); });
+            if (written < 0) {
+                const int error = errno;
+                if (ftruncate(_file.fd(), static_cast<off_t>(*before)) != 0) return std::unexpected(Error::posix(errno, "cutting off a half-written record"));
+                return std::unexpected(Error::posix(error));
+            }
+            auto count = static_cast<std::size_t>(written);
+            while (!left.empty() && count >= left.front().iov_len) {
+                count -= left.front().iov_len;
+                left = left.subspan(1);
+            }
+            if (count > 0) left.front() = {static_cast<char*>(left.front().iov_base) + count, left.front().iov_len - count};
+        }
+        return {};
+    }
+
+private:
+    FileHandle _file;
+};
 
 class SystemFiles final : public FileSystem {
 public:
@@ -162,6 +203,15 @@ public:
         if (!file || fstat(file.fd(), &status) != 0) return failure(path);
         if (!S_ISREG(status.st_mode)) return std::unexpected(Error::posix(S_ISDIR(status.st_mode) ? EISDIR : EINVAL, path.string()));
         return file;
+    }
+
+    Result<std::unique_ptr<AppendFile>> createForAppending(const fs::path& path) override
+    {
+        FileHandle file(retried([&] {
+            return open(path.c_str(), O_RDWR | O_CREAT | O_EXCL | O_APPEND | O_NOFOLLOW | O_CLOEXEC, 0600);
+        }));
+        if (!file) return failure(path);
+        return std::make_unique<SystemAppendFile>(std::move(file));
     }
 };
 

@@ -2,6 +2,7 @@
 
 #include <cstdint>
 #include <filesystem>
+#include <initializer_list>
 #include <memory>
 #include <string>
 #include <string_view>
@@ -38,6 +39,17 @@ struct FileInfo {
     Date created; ///< birth time where the file system has one, else `modified`
 };
 
+/// A file that grows: whole records are added at its end. One thread at a time.
+class AppendFile {
+public:
+    virtual ~AppendFile() = default;
+    /// Bytes in the file.
+    [[nodiscard]] virtual Result<std::uint64_t> size() = 0;
+    /// Adds the bytes of `parts`, one behind the other, in one go. After a failure the file is as long as it was
+    /// before: what was written of a record is cut off again. Not synced.
+    [[nodiscard]] virtual Result<void> append(std::initializer_list<std::string_view> parts) = 0;
+};
+
 /// The file system, as far as the device's services need it. Paths are absolute. The last component of a path is
 /// never followed when it is a link. Any thread.
 ///
@@ -59,6 +71,8 @@ public:
     /// The names in a directory, in no order, without "." and "..".
     [[nodiscard]] virtual Result<std::vector<std::string>> list(const std::filesystem::path& path) = 0;
     [[nodiscard]] virtual Result<FileHandle> openForReading(const std::filesystem::path& path) = 0;
+    /// Makes a new, empty file, mode 0600, and opens it; one that is there already is an error (EEXIST).
+    [[nodiscard]] virtual Result<std::unique_ptr<AppendFile>> createForAppending(const std::filesystem::path& path) = 0;
 };
 
 [[nodiscard]] std::unique_ptr<FileSystem> makeSystemFiles();

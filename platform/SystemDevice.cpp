@@ -5,6 +5,8 @@
 
 #include <systemd/sd-daemon.h>
 
+#include "platform/ActivityScheduler.h"
+#include "platform/BackgroundSession.h"
 #include "platform/Clock.h"
 #include "platform/Counters.h"
 #include "platform/Device.h"
@@ -51,6 +53,7 @@ struct SystemDevice::Impl {
           profile(makeDeviceProfileSource(*files, directories.config / name / "device.json", runLoop)),
           processes(makeProcessIdentity()), notifier(makeSessionBusNotifier(runLoop)),
           ipc(ipc::makeBusTransport(runLoop, pool, *clock, directories.runtime / name)), loader(makeCurlLoader()),
+          backgroundSessions(makeBackgroundSessions()), activities(makeActivityScheduler()),
           device{.clock = *clock,
                  .executor = pool,
                  .mainExecutor = runLoop,
@@ -67,6 +70,8 @@ struct SystemDevice::Impl {
                  .processes = *processes,
                  .systemNotifier = *notifier,
                  .urlLoader = *loader,
+                 .backgroundSessions = *backgroundSessions,
+                 .activities = *activities,
                  .ipc = *ipc}
     {
         device.launchEvents = launchEvents();
@@ -92,6 +97,8 @@ struct SystemDevice::Impl {
     std::unique_ptr<SystemNotifier> notifier;
     std::unique_ptr<ipc::Transport> ipc;
     std::unique_ptr<UrlLoader> loader;
+    std::unique_ptr<BackgroundSessions> backgroundSessions;
+    std::unique_ptr<ActivityScheduler> activities;
     Device device;
 };
 

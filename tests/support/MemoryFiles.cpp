@@ -50,7 +50,7 @@ Result<FileInfo> MemoryFiles::info(const fs::path& path)
     if (const int error = faultOf("info", path)) return std::unexpected(Error::posix(error));
     if (directories.contains(path)) return FileInfo{.kind = FileInfo::Kind::Directory};
     if (!files.contains(path)) return std::unexpected(Error::posix(ENOENT));
-    return FileInfo{.size = files[path].size()};
+    return FileInfo{.size = files[path].size(), .created = created[path]};
 }
 
 Result<void> MemoryFiles::remove(const fs::path& path)
@@ -80,6 +80,37 @@ Result<FileHandle> MemoryFiles::openForReading(const fs::path& path)
     if (write(handle.fd(), contents->data(), contents->size()) < 0) return std::unexpected(Error::posix(errno));
     lseek(handle.fd(), 0, SEEK_SET);
     return handle;
+}
+
+class MemoryFiles::Appending final : public AppendFile {
+public:
+    Appending(MemoryFiles& files, fs::path path) : _files(files), _path(std::move(path)) {}
+    Result<std::uint64_t> size() override
+    {
+        std::lock_guard lock(_files._mutex);
+        return _files.files[_path].size();
+    }
+    Result<void> append(std::initializer_list<std::string_view> parts) override
+    {
+        std::lock_guard lock(_files._mutex);
+        if (const int error = _files.faultOf("append", _path)) return std::unexpected(Error::posix(error));
+        for (const std::string_view part : parts) _files.files[_path] += part;
+        return {};
+    }
+
+private:
+    MemoryFiles& _files;
+    fs::path _path;
+};
+
+Result<std::unique_ptr<AppendFile>> MemoryFiles::createForAppending(const fs::path& path)
+{
+    std::lock_guard lock(_mutex);
+    if (const int error = faultOf("create", path)) return std::unexpected(Error::posix(error));
+    if (!directories.contains(path.parent_path())) return std::unexpected(Error::posix(ENOENT));
+    if (files.contains(path) || directories.contains(path)) return std::unexpected(Error::posix(EEXIST));
+    files[path];
+    return std::make_unique<Appending>(*this, path);
 }
 
 } // namespace platform::test

@@ -12,11 +12,12 @@ namespace platform::test {
 /// Files in memory. An operation fails when the test says so.
 class MemoryFiles final : public FileSystem {
 public:
-    /// Asked before every operation ("read", "write", "mkdir", "info", "remove", "list", "open") with its path; a
+    /// Asked before every operation ("read", "write", "mkdir", "info", "remove", "list", "create", "append") with its path; a
     /// number other than 0 is the errno that it fails with.
     std::function<int(std::string_view operation, const std::filesystem::path& path)> fault;
 
     std::map<std::filesystem::path, std::string> files;
+    std::map<std::filesystem::path, Date> created; ///< where a test cares; else the epoch
     std::set<std::filesystem::path> directories;
 
     Result<Bytes> read(const std::filesystem::path& path, std::size_t maximumSize) override;
@@ -26,8 +27,10 @@ public:
     Result<void> remove(const std::filesystem::path& path) override;
     Result<std::vector<std::string>> list(const std::filesystem::path& path) override;
     Result<FileHandle> openForReading(const std::filesystem::path& path) override;
+    Result<std::unique_ptr<AppendFile>> createForAppending(const std::filesystem::path& path) override;
 
 private:
+    class Appending;
     [[nodiscard]] int faultOf(std::string_view operation, const std::filesystem::path& path) const;
     std::mutex _mutex;
 };

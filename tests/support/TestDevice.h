@@ -14,6 +14,7 @@
 #include "platform/Process.h"
 #include "platform/Transactions.h"
 #include "platform/UserDefaults.h"
+#include "tests/support/FakeBackground.h"
 #include "tests/support/FakeIpc.h"
 #include "tests/support/FakeUrlLoader.h"
 #include "tests/support/ManualClock.h"
@@ -145,6 +146,8 @@ struct TestDevice {
     FakeProcesses processes;
     FakeNotifier notifier;
     FakeUrlLoader loader;
+    FakeBackgroundSessions background{files};
+    FakeActivityScheduler activities;
     FakeTransport ipc{executor, clock};
     Device device{.clock = clock,
                   .executor = executor,
@@ -167,6 +170,8 @@ struct TestDevice {
                   .processes = processes,
                   .systemNotifier = notifier,
                   .urlLoader = loader,
+                  .backgroundSessions = background,
+                  .activities = activities,
                   .ipc = ipc};
 };
 
