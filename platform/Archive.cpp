@@ -361,4 +361,20 @@ Result<std::shared_ptr<Record>> unarchive(std::string_view bytes, const RecordCl
     return record;
 }
 
+std::string archiveValue(const Value& value)
+{
+    ArchiveEncoder encoder;
+    encoder.value(value);
+    return encoder.take();
+}
+
+Result<Value> valueFromArchive(std::string_view bytes)
+{
+    static const RecordClasses kNone;
+    ArchiveDecoder decoder(bytes, kNone);
+    Value value = decoder.value();
+    if (auto error = decoder.error()) return std::unexpected(std::move(*error));
+    return value;
+}
+
 } // namespace platform

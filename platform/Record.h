@@ -299,6 +299,12 @@ public:
 /// The record in an archive. Trailing bytes are an error; declared lengths are checked against what is there.
 [[nodiscard]] Result<std::shared_ptr<Record>> unarchive(std::string_view bytes, const RecordClasses& classes);
 
+/// A plain value as an archive.
+[[nodiscard]] std::string archiveValue(const Value& value);
+/// What an archive holds, as plain values: a record is a dictionary with its class under "class", of any class. Limits as
+/// for `unarchive`.
+[[nodiscard]] Result<Value> valueFromArchive(std::string_view bytes);
+
 /// As above, for a record that must be a `T`.
 template <class T> [[nodiscard]] Result<std::shared_ptr<T>> castRecord(Result<std::shared_ptr<Record>> record)
 {
