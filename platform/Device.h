@@ -15,6 +15,7 @@ class BackgroundSessions;
 class Clock;
 class CounterStore;
 class DeviceProfileSource;
+class InstalledApplications;
 class LocaleSource;
 class LocationSource;
 class NotificationCenter;
@@ -55,6 +56,7 @@ struct Device {
     LocaleSource& locale;
     LocationSource& location;
     DeviceProfileSource& profile;
+    InstalledApplications& applications;
     ProcessIdentity& processes;
     SystemNotifier& systemNotifier;
     UrlLoader& urlLoader;

@@ -21,10 +21,12 @@ struct FileWatch::Impl {
     fs::path watched;   // that directory
     std::unique_ptr<RunLoop::Watch> watch;
 
+    [[nodiscard]] fs::path folder() const { return path.parent_path(); }
+
     /// Watches the file's directory, or the nearest parent that is there.
     void aim()
     {
-        fs::path nearest = path.parent_path();
+        fs::path nearest = folder();
         std::error_code ignored;
         while (!fs::is_directory(nearest, ignored) && nearest.has_relative_path()) nearest = nearest.parent_path();
         if (nearest == watched) return;
@@ -44,9 +46,9 @@ struct FileWatch::Impl {
         while ((size = read(inotify.fd(), buffer.data(), buffer.size())) > 0) {
             for (ssize_t at = 0; at < size;) {
                 const auto* event = reinterpret_cast<const inotify_event*>(buffer.data() + at);
-                if (event->len > 0 && watched / event->name == path)
+                if (event->len > 0 && (path.has_filename() ? watched / event->name == path : watched == folder()))
                     mine = true;
-                else if (event->len == 0 || watched != path.parent_path())
+                else if (event->len == 0 || watched != folder())
                     elsewhere = true;
                 at += static_cast<ssize_t>(sizeof(inotify_event) + event->len);
             }
@@ -55,7 +57,7 @@ struct FileWatch::Impl {
             const fs::path before = watched;
             if (!fs::exists(watched)) watched.clear();
             aim();
-            mine = mine || (watched == path.parent_path() && before != watched);
+            mine = mine || (before != watched && (before == folder() || watched == folder()));
         }
         if (mine) changed();
     }

@@ -9,7 +9,8 @@ namespace platform {
 class RunLoop;
 
 /// Watches one path by inotify, so that it is seen when the file is made, written, replaced or removed. The directory is
-/// watched, not the file; where it is missing, its nearest parent is, until it is made.
+/// watched, not the file; where it is missing, its nearest parent is, until it is made. A path that ends in "/" stands
+/// for everything that is directly in that directory.
 ///
 /// Made and destroyed on the run loop's thread; `changed` is called there, once for a burst of changes.
 class FileWatch {

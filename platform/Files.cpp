@@ -1,5 +1,6 @@
 #include "platform/Files.h"
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <cstdlib>
@@ -221,6 +222,18 @@ fs::path fromEnvironmentOr(const char* variable, const fs::path& fallback)
     return value && *value == '/' ? fs::path(value) : fallback; // relative paths are to be ignored
 }
 
+/// The absolute paths of a list with ":" between them.
+std::vector<fs::path> pathsIn(std::string_view list)
+{
+    std::vector<fs::path> paths;
+    while (!list.empty()) {
+        const std::string_view path = list.substr(0, list.find(':'));
+        list.remove_prefix(std::min(path.size() + 1, list.size()));
+        if (path.starts_with('/')) paths.emplace_back(path);
+    }
+    return paths;
+}
+
 fs::path home()
 {
     if (const char* value = std::getenv("HOME"); value && *value == '/') return value;
@@ -243,6 +256,8 @@ Directories Directories::fromEnvironment()
     directories.state = fromEnvironmentOr("XDG_STATE_HOME", home() / ".local/state");
     directories.data = fromEnvironmentOr("XDG_DATA_HOME", home() / ".local/share");
     directories.temporary = fromEnvironmentOr("TMPDIR", "/tmp");
+    const char* systemData = std::getenv("XDG_DATA_DIRS");
+    directories.systemData = pathsIn(systemData && *systemData ? systemData : "/usr/local/share:/usr/share");
     directories.runtime =
         fromEnvironmentOr("XDG_RUNTIME_DIR", directories.temporary / fmt::format("runtime-{}", getuid()));
     return directories;

@@ -85,6 +85,7 @@ struct Directories {
     std::filesystem::path data;    ///< $XDG_DATA_HOME, else ~/.local/share
     std::filesystem::path runtime; ///< $XDG_RUNTIME_DIR, else $TMPDIR/runtime-UID
     std::filesystem::path temporary; ///< $TMPDIR, else /tmp
+    std::vector<std::filesystem::path> systemData; ///< $XDG_DATA_DIRS, else /usr/local/share and /usr/share
 
     [[nodiscard]] static Directories fromEnvironment();
 };

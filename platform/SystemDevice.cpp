@@ -11,6 +11,7 @@
 #include "platform/Counters.h"
 #include "platform/Device.h"
 #include "platform/DeviceProfile.h"
+#include "platform/InstalledApplications.h"
 #include "platform/Ipc.h"
 #include "platform/LocaleSource.h"
 #include "platform/LocationSource.h"
@@ -39,6 +40,14 @@ std::vector<std::string> launchEvents()
     return events;
 }
 
+/// The user's and the system's, in the order in which they are looked through.
+std::vector<std::filesystem::path> dataDirectories(const Directories& directories)
+{
+    std::vector<std::filesystem::path> all = directories.systemData;
+    all.insert(all.begin(), directories.data);
+    return all;
+}
+
 } // namespace
 
 struct SystemDevice::Impl {
@@ -51,6 +60,7 @@ struct SystemDevice::Impl {
           counters(*files, directories.state / name / "counters.json", storeQueue), locale(makeLocaleSource(runLoop)),
           location(makeGeoClueLocationSource(runLoop)),
           profile(makeDeviceProfileSource(*files, directories.config / name / "device.json", runLoop)),
+          applications(makeInstalledApplications(*files, dataDirectories(directories), runLoop, *clock)),
           processes(makeProcessIdentity()), notifier(makeSessionBusNotifier(runLoop)),
           ipc(ipc::makeBusTransport(runLoop, pool, *clock, directories.runtime / name)), loader(makeCurlLoader()),
           backgroundSessions(makeBackgroundSessions()), activities(makeActivityScheduler()),
@@ -67,6 +77,7 @@ struct SystemDevice::Impl {
                  .locale = *locale,
                  .location = *location,
                  .profile = *profile,
+                 .applications = *applications,
                  .processes = *processes,
                  .systemNotifier = *notifier,
                  .urlLoader = *loader,
@@ -93,6 +104,7 @@ struct SystemDevice::Impl {
     std::unique_ptr<LocaleSource> locale;
     std::unique_ptr<LocationSource> location;
     std::unique_ptr<DeviceProfileSource> profile;
+    std::unique_ptr<InstalledApplications> applications;
     std::unique_ptr<ProcessIdentity> processes;
     std::unique_ptr<SystemNotifier> notifier;
     std::unique_ptr<ipc::Transport> ipc;

@@ -7,6 +7,7 @@
 #include "platform/Counters.h"
 #include "platform/Device.h"
 #include "platform/DeviceProfile.h"
+#include "platform/InstalledApplications.h"
 #include "platform/LocaleSource.h"
 #include "platform/LocationSource.h"
 #include "platform/Log.h"
@@ -61,6 +62,18 @@ struct FakeProfile final : DeviceProfileSource {
         current = std::move(profile);
         handler(current);
     }
+};
+
+struct FakeApplications final : InstalledApplications {
+    std::vector<InstalledApplication> installed;
+    int readings = 0;
+    std::function<void()> handler;
+    std::vector<InstalledApplication> applications() override
+    {
+        ++readings;
+        return installed;
+    }
+    void onChange(std::function<void()> newHandler) override { handler = std::move(newHandler); }
 };
 
 struct FakeProcesses final : ProcessIdentity {
@@ -143,6 +156,7 @@ struct TestDevice {
     FakeLocale locale;
     FakeLocation location;
     FakeProfile profile;
+    FakeApplications applications;
     FakeProcesses processes;
     FakeNotifier notifier;
     FakeUrlLoader loader;
@@ -167,6 +181,7 @@ struct TestDevice {
                   .locale = locale,
                   .location = location,
                   .profile = profile,
+                  .applications = applications,
                   .processes = processes,
                   .systemNotifier = notifier,
                   .urlLoader = loader,
