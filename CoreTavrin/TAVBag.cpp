@@ -12,8 +12,8 @@ using platform::Url;
 using platform::Value;
 
 const std::vector<std::string_view> kTAVResourceIdentifiers{
-    "TAVAutofillTLDWhitelist", "TAVInstalledAppWhitelist", "TAVQIFeatures",     "TAVWebsiteCategoryLabels",
-    "TAVLookupHintsWeekly",    "TAVLookupHintsMonthly",    "TAVVistrelModels",  "TAVCorrectionDict",
+    "TAVAutofillTLDWhitelist", kTAVInstalledAppWhitelist, "TAVQIFeatures",    "TAVWebsiteCategoryLabels",
+    kTAVLookupHintsWeekly,     kTAVLookupHintsMonthly,    "TAVVistrelModels", "TAVCorrectionDict",
     "TAVCrowdsourcingBlacklist", "TAVCrowdsourcingWhitelist"};
 
 namespace {

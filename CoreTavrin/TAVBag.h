@@ -67,6 +67,9 @@ private:
     std::string _userAgent;
 };
 
+inline constexpr std::string_view kTAVInstalledAppWhitelist = "TAVInstalledAppWhitelist";
+inline constexpr std::string_view kTAVLookupHintsWeekly = "TAVLookupHintsWeekly";
+inline constexpr std::string_view kTAVLookupHintsMonthly = "TAVLookupHintsMonthly";
 /// Identifiers of the downloadable resources, in the order in which they are processed.
 extern const std::vector<std::string_view> kTAVResourceIdentifiers;
 

@@ -77,7 +77,7 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device)
     assembly.lookup = std::make_shared<Lookup>(assembly);
     assembly.bagController = TavrinBagController::make(assembly);
     assembly.clientStateManager = ClientStateManager::make(assembly);
-    assembly.appWhitelistController = std::make_shared<AppWhitelistController>(assembly);
+    assembly.appWhitelistController = AppWhitelistController::make(assembly);
     daemon->deepLinkIngester = std::make_shared<TavrinDPAppDeepLinkIngester>(assembly);
     daemon->deepLinkIngester->scheduleMaintenance();
     daemon->service = TavrinService::make(assembly);

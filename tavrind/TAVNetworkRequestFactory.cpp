@@ -239,7 +239,7 @@ UrlRequest TAVNetworkRequestFactory::build(Recipe& recipe)
 {
     // Asked for before the queue is entered: the controllers have queues of their own.
     if ((recipe.kind & kClient & ~kZeroKeyword) && _assembly.appWhitelistController)
-        recipe.signature = _assembly.appWhitelistController->signature();
+        recipe.signature = _assembly.appWhitelistController->whitelistSignature();
 
     UrlRequest request = _contextAccessQueue->sync([&] {
         if (recipe.request)

@@ -1,0 +1,27 @@
+#include "fuzz/Check.h"
+#include "platform/InstalledApplications.h"
+#include "tavrind/AppWhitelistController.h"
+#include "tavrind/decoder.h"
+
+namespace {
+
+struct Installed final : platform::InstalledApplications {
+    std::vector<platform::InstalledApplication> applications() override
+    {
+        return {{"", "1"}, {"a", "1"}, {"b", "1"}, {"org.example.Mail", "2.1"}, {"unversioned", ""}};
+    }
+    void onChange(std::function<void()>) override {}
+};
+
+} // namespace
+
+/// The input is an allow-list. Where it gives a signature, a service can read it.
+int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
+{
+    Installed installed;
+    if (const auto signature = tavrin::processWhitelist(textOf(data, size), installed)) {
+        const auto read = tavrin::readSignature(*signature);
+        check(read.has_value(), *signature);
+    }
+    return 0;
+}

@@ -1,0 +1,241 @@
+#include <gtest/gtest.h>
+
+#include <array>
+#include <fstream>
+#include <random>
+#include <set>
+#include <sstream>
+#include <sys/mman.h>
+#include <unistd.h>
+
+#include "CoreTavrin/TAVBag.h"
+#include "tavrind/AppWhitelistController.h"
+#include "tavrind/Assembly.h"
+#include "tavrind/decoder.h"
+#include "tavrind/DownloadManager.h"
+#include "tavrind/encoder.h"
+#include "tavrind/mmap_file.h"
+#include "tests/support/TestDevice.h"
+
+namespace tavrin {
+namespace {
+
+using platform::Value;
+
+std::optional<std::string> signatureOf(const std::vector<std::uint32_t>& ids, std::string_view version = "0a1b2c")
+{
+    const std::string bitmap = bitmapOf(ids);
+    return makeSignature(static_cast<std::uint16_t>(bitmap.size()), rle_compress(bitmap), version);
+}
+
+std::set<std::uint32_t> idsIn(std::string_view bitmap)
+{
+    std::set<std::uint32_t> ids;
+    for (std::uint32_t bit = 0; bit < bitmap.size() * 8; ++bit)
+        if (static_cast<unsigned char>(bitmap[bit / 8]) & 0x80u >> bit % 8) ids.insert(bit);
+    return ids;
+}
+
+TEST(AppSignature, AnyIdsComeBackButALargestMultipleOfEight)
+{
+    std::mt19937 random(20260101);
+    const auto below = [&](std::uint32_t limit) {
+        return std::uniform_int_distribution<std::uint32_t>(0, limit - 1)(random);
+    };
+    int compressed = 0;
+    for (int round = 0; round < 150; ++round) {
+        const std::uint32_t range = std::array{9u, 300u, 5000u, kMaximumEncodingId + 1}[below(4)];
+        std::set<std::uint32_t> ids;
+        for (std::uint32_t i = below(range < 6000 ? range : 40) + 1; i > 0; --i) ids.insert(below(range));
+        if (round % 3 == 0) // a long run
+            for (std::uint32_t i = below(range); i < range && ids.size() < 2000; ++i) ids.insert(i);
+        const auto read = readSignature(*signatureOf({ids.begin(), ids.end()}));
+        ASSERT_TRUE(read) << round << ": " << read.error().description();
+        if (*ids.rbegin() % 8 == 0) ids.erase(std::prev(ids.end()));
+        ASSERT_EQ(idsIn(read->bitmap), ids) << round;
+        compressed += read->compressed;
+    }
+    EXPECT_GT(compressed, 20);
+    EXPECT_LT(compressed, 130);
+}
+
+TEST(AppSignature, CodesRunsOnlyWhereThatIsShorter)
+{
+    const std::string ones(38, '\xff');
+    const std::string mixed = ones.substr(1) + '\xf0';
+    const struct {
+        std::string bitmap;
+        bool compressed;
+        std::string payload;
+    } cases[]{
+        {"\x50", false, "\x50"},
+        {std::string(40, '\xaa'), false, std::string(40, '\xaa')},
+        {"", false, ""},
+        {std::string(4, '\0'), false, std::string(4, '\0')}, // one run: 4 bytes, which is not shorter
+        {std::string(5, '\0'), true, std::string("\0\1\x27\0", 4)},
+        {mixed, true, std::string("\0\3\xff\x2b\3\xc0", 6)}, // 300 ones: 256 and 44
+        {std::string(64, '\xff'), true, std::string("\0\2\xff\xff\xc0", 5)},
+    };
+    for (const auto& c : cases) {
+        const RunLengthCoding coding = encodeRun(c.bitmap);
+        EXPECT_EQ(coding.compressed, c.compressed) << c.bitmap.size();
+        EXPECT_EQ(coding.bytes, c.payload) << c.bitmap.size();
+    }
+}
+
+TEST(AppSignature, ExpandsNothingThatDoesNotAddUp)
+{
+    const std::string coded = std::string("MD5.") + std::string("\0\3\xff\x2b\3\xc0", 6);
+    EXPECT_EQ(rle_expand(coded, 4, 6, 38, true), std::string(37, '\xff') + '\xf0');
+    EXPECT_EQ(rle_expand(coded, 4, 6, 40, true), std::string(37, '\xff') + std::string("\xf0\0\0", 3))
+        << "too few bits";
+    EXPECT_FALSE(rle_expand(coded, 4, 6, 37, true)) << "too many bits";
+    EXPECT_FALSE(rle_expand(coded, 4, 5, 38, true)) << "not as long as its runs";
+    EXPECT_FALSE(rle_expand(coded, 5, 6, 38, true)) << "beyond the end";
+    EXPECT_FALSE(rle_expand(coded, 99, 6, 38, true));
+    EXPECT_FALSE(rle_expand(coded, 4, 1, 38, true));
+    EXPECT_EQ(rle_expand("MD5.abc", 4, 3, 3, false), "abc");
+    EXPECT_FALSE(rle_expand("MD5.abc", 4, 3, 4, false));
+
+    std::string text = *signatureOf({1, 3, 20}); // 15 bytes: every character counts
+    for (char& c : text) {
+        const char kept = std::exchange(c, c == 'A' ? 'B' : 'A');
+        EXPECT_FALSE(readSignature(text)) << text;
+        c = kept;
+    }
+    for (const char* broken : {"", "AAAA", "0VH2", "====", "0VH2KBssAAGaD9qqUA= "}) EXPECT_FALSE(readSignature(broken));
+}
+
+TEST(AppSignature, VersionsAreHexadecimalBytesOfWhichTheLastTwoCount)
+{
+    const struct {
+        const char* text;
+        std::optional<unsigned> version;
+    } cases[]{{"0a1b2c", 0x1b2c}, {"0a9b2c", 0x1b2c}, {"FFff", 0x7fff}, {"2c", 0x2c},   {"", 0},
+              {"0a1", {}},        {"0a1g", {}},       {"0x1b", {}},     {" a1b2c", {}}, {"-1b2", {}}};
+    for (const auto& c : cases) {
+        const auto signature = signatureOf({1, 3}, c.text);
+        EXPECT_EQ(signature ? std::optional(readSignature(*signature)->version) : std::nullopt, c.version) << c.text;
+    }
+}
+
+/// The blocks of hexadecimal bytes in a page, as base64 texts.
+std::set<std::string> hexExamples(const char* page)
+{
+    std::ifstream file(std::string(SOURCE_DIR "/docs/") + page);
+    std::set<std::string> examples;
+    for (std::string line, before; std::getline(file, line); before = line) {
+        if (before != "```") continue;
+        std::istringstream words(line);
+        std::string bytes;
+        for (unsigned byte = 0; words >> std::hex >> byte;) bytes += static_cast<char>(byte);
+        const std::string text = platform::toJson(Value(platform::Bytes(bytes)));
+        examples.insert(text.substr(1, text.size() - 2));
+    }
+    return examples;
+}
+
+TEST(AppSignature, IsAsTheExamplesOfThePageSay)
+{
+    std::vector<std::uint32_t> first300;
+    for (std::uint32_t id = 0; id < 300; ++id) first300.push_back(id);
+    const auto examples = hexExamples("formats.md");
+    EXPECT_TRUE(examples.contains(*signatureOf({1, 3})));
+    EXPECT_TRUE(examples.contains(*signatureOf(first300, "0a9b2c")));
+}
+
+std::string listOf(std::string_view inner, std::string_view compression = "RLE", std::string_view encoding = "bitmap")
+{
+    return platform::toJson(
+        Value::dictionaryOf({{"apps", inner}, {"compression", compression}, {"encoding", encoding}}));
+}
+
+TEST(AppWhitelist, GivesNoSignatureForWhatIsNoListOrNamesNothingInstalled)
+{
+    const std::string sound =
+        R"({"version": "0a1b2c", "apps": {"one": [{"encoding_id": 1}], "many": [{"encoding_id": 9}, 5,
+        {"encoding_id": 3}], "eight": [{"encoding_id": 8}], "zero": [{"encoding_id": 0}], "huge": [{"encoding_id": 524280}],
+        "half": [{"encoding_id": 1.5}], "minus": [{"encoding_id": -1}], "text": [{"encoding_id": "2"}], "none": [],
+        "last": [{"encoding_id": 2}, 7], "object": {"encoding_id": 2}, "yes": [{"encoding_id": true}]}})";
+    using Names = std::vector<std::string>;
+    const struct {
+        std::string list;
+        Names installed;
+        std::optional<std::string> bitmap;
+    } cases[]{
+        {listOf(sound), {"one", "many", "other"}, "\x50"},
+        {listOf(sound), {"one", "eight"}, "\x40"},
+        {listOf(sound), {"zero"}, ""},
+        {listOf(sound), {"one", "huge", "half", "minus", "text", "none", "last", "object", "yes"}, "\x40"},
+        {listOf(sound), {"other"}, {}},
+        {listOf(sound), {}, {}},
+        {listOf(sound, "LZ"), {"one"}, {}},
+        {listOf(sound, "RLE", "list"), {"one"}, {}},
+        {listOf("{"), {"one"}, {}},
+        {listOf(R"({"version": 12, "apps": {"one": [{"encoding_id": 1}]}})"), {"one"}, {}},
+        {listOf(R"({"version": "0a1", "apps": {"one": [{"encoding_id": 1}]}})"), {"one"}, {}},
+        {listOf(R"({"version": "0a1b", "apps": [{"encoding_id": 1}]})"), {"one"}, {}},
+        {R"({"apps": {"version": "0a1b"}, "compression": "RLE", "encoding": "bitmap"})", {"one"}, {}},
+        {"[]", {"one"}, {}},
+        {"", {"one"}, {}},
+    };
+    platform::test::TestDevice device;
+    for (const auto& c : cases) {
+        device.applications.installed.clear();
+        for (const std::string& name : c.installed) device.applications.installed.push_back({name, "0"});
+        device.applications.installed.push_back({"one", ""}); // without a version it doesn't count
+        const auto signature = processWhitelist(c.list, device.applications);
+        EXPECT_EQ(signature ? std::optional(readSignature(*signature)->bitmap) : std::nullopt, c.bitmap) << c.list;
+    }
+    device.applications.readings = 0;
+    EXPECT_FALSE(processWhitelist("{}", device.applications));
+    EXPECT_EQ(device.applications.readings, 0) << "for nothing";
+}
+
+struct AppWhitelistControllerTest : testing::Test {
+    std::shared_ptr<AppWhitelistController> make()
+    {
+        assembly.downloadManager = std::make_shared<DownloadManager>(assembly);
+        auto controller = AppWhitelistController::make(assembly);
+        device.drain();
+        return controller;
+    }
+    platform::test::TestDevice device;
+    platform::test::LogCapture log;
+    Assembly assembly{device.device};
+};
+
+TEST_F(AppWhitelistControllerTest, AStoredSignatureIsUsedUntilApplicationsChangeAndThenGoesWithItsReason)
+{
+    device.userDefaults.set("TAVAppWhitelistSignature", "c3RvcmVk");
+    const auto controller = make();
+    EXPECT_EQ(controller->whitelistSignature(), "c3RvcmVk");
+    EXPECT_EQ(log.count("generating app whitelist"), 0);
+
+    device.applications.handler();
+    device.drain();
+    EXPECT_EQ(log.count("error reading app whitelist"), 1);
+    EXPECT_EQ(controller->whitelistSignature(), "");
+    EXPECT_TRUE(device.userDefaults.value("TAVAppWhitelistSignature").isNull());
+}
+
+TEST_F(AppWhitelistControllerTest, ComputesAtOnceWhereNothingIsStored)
+{
+    const auto controller = make();
+    EXPECT_EQ(log.count("generating app whitelist"), 1);
+    EXPECT_EQ(device.applications.readings, 0) << "there is no list to read them for";
+}
+
+TEST(MappedFile, OutlivesItsHandleAndAnEmptyOneIsAnError)
+{
+    platform::FileHandle file(memfd_create("list", MFD_CLOEXEC));
+    EXPECT_EQ(mmapFileHandle(file).error().code, EINVAL);
+    ASSERT_EQ(write(file.fd(), "mapped", 6), 6);
+    const auto bytes = mmapFileHandle(file);
+    file = {};
+    EXPECT_EQ(bytes->view(), "mapped");
+    EXPECT_EQ(mmapFileHandle(file).error().code, EBADF);
+}
+
+} // namespace
+} // namespace tavrin
