@@ -113,6 +113,19 @@ std::shared_ptr<Record> decodeRecord(Decoder& decoder)
     return decoder.failed() ? nullptr : record;
 }
 
+std::shared_ptr<Record> decodeRecordIfKnown(Decoder& decoder)
+{
+    const std::string className = decoder.beginRecord();
+    auto record = decoder.classes().make(className);
+    if (record) {
+        decodeFields(decoder, *record);
+    } else {
+        std::string_view key;
+        while (decoder.nextKey(key)) decoder.skip();
+    }
+    return decoder.failed() ? nullptr : record;
+}
+
 void decodeRecordInto(Decoder& decoder, Record& record)
 {
     const std::string className = decoder.beginRecord();

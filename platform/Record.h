@@ -118,6 +118,8 @@ class Record {
 public:
     virtual ~Record() = default;
     [[nodiscard]] virtual std::string_view className() const = 0;
+    /// A record of the same class with the same fields; records in them are shared.
+    [[nodiscard]] virtual std::shared_ptr<Record> copy() const = 0;
     [[nodiscard]] virtual std::size_t fieldCount() const { return 0; }
     virtual void encodeFields(Encoder&) const {}
     /// Reads the value of `key`; false if the record has no such field, and nothing is taken.
@@ -159,8 +161,16 @@ private:
 };
 
 void encodeRecord(Encoder& encoder, const Record& record);
+/// A copy of a record that is a `T`, and of its class: see `Record::copy`.
+template <class T> [[nodiscard]] std::shared_ptr<T> copyOf(const T& record)
+{
+    return std::static_pointer_cast<T>(record.copy());
+}
+
 /// Reads a record of any known class; null after a failure.
 [[nodiscard]] std::shared_ptr<Record> decodeRecord(Decoder& decoder);
+/// The same, but a record of an unknown class is skipped: null, and no failure.
+[[nodiscard]] std::shared_ptr<Record> decodeRecordIfKnown(Decoder& decoder);
 /// Reads the record at hand into `record`, which must be of the class found there.
 void decodeRecordInto(Decoder& decoder, Record& record);
 
@@ -259,6 +269,11 @@ public:
 
     [[nodiscard]] std::string_view className() const override { return Self::kClass; }
 
+    [[nodiscard]] std::shared_ptr<Record> copy() const override
+    {
+        return std::make_shared<Self>(static_cast<const Self&>(*this));
+    }
+
     [[nodiscard]] std::size_t fieldCount() const override
     {
         return Base::fieldCount() + std::tuple_size_v<decltype(Self::fields())>;
@@ -287,8 +302,7 @@ public:
     }
 };
 
-/// A record as a dictionary with its class under "class": the form that crosses IPC as a{sv}. Null fields and empty
-/// arrays of records or plain values are left out.
+/// A record as a dictionary with its class under "class": the form that crosses IPC as a{sv}. Null fields are left out.
 [[nodiscard]] Value toValue(const Record& record);
 /// The record in such a dictionary. A date may be a number, seconds since 1970, as IPC messages have them. Records may
 /// nest `kMaximumDepth` deep, here and in archives; so may a field of type Value in itself.

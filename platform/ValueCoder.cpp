@@ -18,11 +18,7 @@ public:
     void key(std::string_view name) override { _open.back().key = name; }
     void endRecord() override { put(close().record.value()); }
     void beginArray(std::size_t count) override { _open.emplace_back().elements.reserve(count); }
-    void endArray() override
-    {
-        Value::Array elements = close().elements;
-        if (!elements.empty() || !_open.back().record) put(std::move(elements));
-    }
+    void endArray() override { put(close().elements); }
     void null() override { put(nullptr); }
     void boolean(bool value) override { put(value); }
     void integer(std::int64_t value) override { put(value); }

@@ -31,13 +31,14 @@ struct Whole : RecordOf<Whole> {
     std::optional<Error> error;
     std::vector<std::shared_ptr<Part>> parts;
     std::vector<std::string> names;
+    std::optional<std::vector<std::string>> list;
     static constexpr auto fields()
     {
         return std::tuple{field("flag", &Whole::flag),   field("small", &Whole::small), field("large", &Whole::large),
                           field("color", &Whole::color), field("text", &Whole::text),   field("note", &Whole::note),
                           field("uuid", &Whole::uuid),   field("bytes", &Whole::bytes), field("date", &Whole::date),
                           field("any", &Whole::any),     field("error", &Whole::error), field("parts", &Whole::parts),
-                          field("names", &Whole::names)};
+                          field("names", &Whole::names), field("list", &Whole::list)};
     }
 };
 
@@ -124,7 +125,7 @@ TEST(Record, EveryFieldSurvivesBothEncodings)
     EXPECT_FALSE(castRecord<Part>(unarchive(bytes, classes())));
 }
 
-TEST(Record, EmptyFieldsAreLeftOutOfValuesButNotOfArchives)
+TEST(Record, NullFieldsAreLeftOutOfValuesButNotOfArchives)
 {
     EXPECT_EQ(toValue(Part()), Value::dictionaryOf({{"class", "Part"}, {"score", 0.0}}));
     EXPECT_EQ(archive(Part()), std::string("\x83\xa5"
@@ -132,8 +133,32 @@ TEST(Record, EmptyFieldsAreLeftOutOfValuesButNotOfArchives)
                                            "Part\xa5score\xcb\0\0\0\0\0\0\0\0\xa5inner\xc0",
                                            34));
     const Value whole = toValue(Whole());
-    EXPECT_FALSE(whole.asDictionary()->contains("names"));
+    EXPECT_EQ(whole["names"], Value(Value::Array()));
+    EXPECT_FALSE(whole.asDictionary()->contains("list"));
     EXPECT_FALSE(whole.asDictionary()->contains("any"));
+}
+
+TEST(Record, AnArrayThatMayBeMissingIsToldFromAnEmptyOne)
+{
+    Whole record;
+    for (const auto& list : {std::optional<std::vector<std::string>>(), {{}}, {{"a"}}}) {
+        record.list = list;
+        for (const auto& decoded :
+             {recordFromValue(toValue(record), classes()), unarchive(archive(record), classes())}) {
+            ASSERT_TRUE(decoded) << decoded.error().description();
+            EXPECT_EQ(std::dynamic_pointer_cast<Whole>(*decoded)->list, list);
+        }
+    }
+}
+
+TEST(Record, CopiesKeepTheClassAndShareInnerRecords)
+{
+    const auto record = sample();
+    const std::shared_ptr<Whole> copy = copyOf<Whole>(*record);
+    EXPECT_EQ(archive(*copy), archive(*record));
+    EXPECT_EQ(copy->parts[0], record->parts[0]);
+    copy->parts.clear();
+    EXPECT_EQ(record->parts.size(), 2u);
 }
 
 TEST(Record, UnknownKeysAreSkippedAndMissingOnesReadAsZero)

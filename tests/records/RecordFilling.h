@@ -128,6 +128,7 @@ inline std::map<std::string, Value> fill(platform::Record& record, const platfor
         for (const auto& [nested, factory] : classes) {
             Filler filler(classes, std::string(nested), number);
             if (!record.decodeField(name, filler) || filler.failed()) continue;
+            if (!(platform::toValue(record)[name] == filler.given())) continue; // read as null
             given[name] = filler.given();
             break;
         }
@@ -140,6 +141,7 @@ class LooseRecord final : public platform::Record {
 public:
     explicit LooseRecord(const Value& dictionary) : _dictionary(*dictionary.asDictionary()) {}
     [[nodiscard]] std::string_view className() const override { return *_dictionary.find("class")->asString(); }
+    [[nodiscard]] std::shared_ptr<Record> copy() const override { return std::make_shared<LooseRecord>(*this); }
     [[nodiscard]] std::size_t fieldCount() const override { return _dictionary.size() - 1; }
     void encodeFields(platform::Encoder& encoder) const override
     {
