@@ -15,7 +15,7 @@ namespace tavrin {
 struct ZRVisibleResultsFeedback : platform::RecordOf<ZRVisibleResultsFeedback, ZRFeedback> {
     static constexpr std::string_view kClass = "ZRVisibleResultsFeedback";
     VisibleResultsTrigger triggerEvent = VisibleResultsTrigger::Unknown;
-    std::vector<std::shared_ptr<ZRSearchResult>> results;
+    RecordArray<ZRSearchResult> results;
     static constexpr auto fields()
     {
         using Self = ZRVisibleResultsFeedback;
@@ -46,7 +46,7 @@ struct ZRSectionRankingFeedback : platform::RecordOf<ZRSectionRankingFeedback, Z
     static constexpr std::string_view kClass = "ZRSectionRankingFeedback";
     std::shared_ptr<ZRResultSection> section;
     std::uint64_t localSectionPosition = 0; ///< before the service's ranking
-    std::vector<std::shared_ptr<ZRResultRankingFeedback>> results;
+    RecordArray<ZRResultRankingFeedback> results;
     static constexpr auto fields()
     {
         using Self = ZRSectionRankingFeedback;
@@ -59,7 +59,7 @@ struct ZRSectionRankingFeedback : platform::RecordOf<ZRSectionRankingFeedback, Z
 /// Sections were ranked.
 struct ZRRankingFeedback : platform::RecordOf<ZRRankingFeedback, ZRFeedback> {
     static constexpr std::string_view kClass = "ZRRankingFeedback";
-    std::vector<std::shared_ptr<ZRSectionRankingFeedback>> sections;
+    RecordArray<ZRSectionRankingFeedback> sections;
     double blendingDuration = 0; ///< seconds that local and remote results took to blend
     static constexpr auto fields()
     {
@@ -90,7 +90,7 @@ struct ZRResultEngagementFeedback : platform::RecordOf<ZRResultEngagementFeedbac
 /// Results came too late to be shown.
 struct ZRResultsReceivedAfterTimeoutFeedback : platform::RecordOf<ZRResultsReceivedAfterTimeoutFeedback, ZRFeedback> {
     static constexpr std::string_view kClass = "ZRResultsReceivedAfterTimeoutFeedback";
-    std::vector<std::shared_ptr<ZRSearchResult>> results;
+    RecordArray<ZRSearchResult> results;
     static constexpr auto fields()
     {
         return std::tuple{platform::field("results", &ZRResultsReceivedAfterTimeoutFeedback::results)};
@@ -100,7 +100,7 @@ struct ZRResultsReceivedAfterTimeoutFeedback : platform::RecordOf<ZRResultsRecei
 /// Sections came late and were added below those shown.
 struct ZRLateSectionsAppendedFeedback : platform::RecordOf<ZRLateSectionsAppendedFeedback, ZRFeedback> {
     static constexpr std::string_view kClass = "ZRLateSectionsAppendedFeedback";
-    std::vector<std::shared_ptr<ZRResultSection>> sections;
+    RecordArray<ZRResultSection> sections;
     static constexpr auto fields()
     {
         return std::tuple{platform::field("sections", &ZRLateSectionsAppendedFeedback::sections)};
@@ -135,7 +135,7 @@ struct ZRVisibleSectionHeaderFeedback : platform::RecordOf<ZRVisibleSectionHeade
 /// Suggestions came into view.
 struct ZRVisibleSuggestionsFeedback : platform::RecordOf<ZRVisibleSuggestionsFeedback, ZRFeedback> {
     static constexpr std::string_view kClass = "ZRVisibleSuggestionsFeedback";
-    std::vector<std::shared_ptr<ZRSearchSuggestion>> suggestions;
+    RecordArray<ZRSearchSuggestion> suggestions;
     static constexpr auto fields()
     {
         return std::tuple{platform::field("suggestions", &ZRVisibleSuggestionsFeedback::suggestions)};

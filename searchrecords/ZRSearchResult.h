@@ -12,6 +12,9 @@
 /// What a search finds: results, sections of them, and suggestions.
 namespace tavrin {
 
+/// Records that a client may leave out, which is not the same as sending none.
+template <class T> using RecordArray = std::optional<std::vector<std::shared_ptr<T>>>;
+
 /// A piece of text as it is shown.
 struct ZRText : platform::RecordOf<ZRText> {
     static constexpr std::string_view kClass = "ZRText";
@@ -98,7 +101,7 @@ struct ZRResultSection : platform::RecordOf<ZRResultSection> {
     std::optional<std::string> identifier;
     std::optional<std::string> bundleIdentifier;
     double score = 0;
-    std::vector<std::shared_ptr<ZRSearchResult>> results;
+    RecordArray<ZRSearchResult> results;
 
     static constexpr auto fields()
     {

@@ -34,17 +34,21 @@ std::uint64_t queryIdOf(const std::shared_ptr<ZRSearchResult>& result)
 {
     return result ? result->queryId : 0;
 }
-std::uint64_t queryIdOf(const std::vector<std::shared_ptr<ZRSearchResult>>& results)
+std::uint64_t queryIdOf(const RecordArray<ZRSearchResult>& results)
 {
-    return results.empty() ? 0 : queryIdOf(results.front());
+    return results && !results->empty() ? queryIdOf(results->front()) : 0;
 }
 std::uint64_t queryIdOf(const std::shared_ptr<ZRResultSection>& section)
 {
     return section ? queryIdOf(section->results) : 0;
 }
-std::uint64_t queryIdOf(const std::vector<std::shared_ptr<ZRResultSection>>& sections)
+std::uint64_t queryIdOf(const RecordArray<ZRResultSection>& sections)
 {
-    return sections.empty() ? 0 : queryIdOf(sections.front());
+    return sections && !sections->empty() ? queryIdOf(sections->front()) : 0;
+}
+std::uint64_t queryIdOf(const RecordArray<ZRSectionRankingFeedback>& sections)
+{
+    return sections && !sections->empty() && sections->front() ? queryIdOf(sections->front()->section) : 0;
 }
 
 /// A request of any other class gets no reply.
@@ -73,8 +77,7 @@ RequestReply traced(RequestReply reply, TAVTraceCode answer)
 std::uint64_t clientQueryIdOf(const ZRFeedback& feedback)
 {
     if (const auto* f = dynamic_cast<const ZRStartSearchFeedback*>(&feedback)) return f->queryId;
-    if (const auto* f = dynamic_cast<const ZRRankingFeedback*>(&feedback))
-        return f->sections.empty() || !f->sections.front() ? 0 : queryIdOf(f->sections.front()->section);
+    if (const auto* f = dynamic_cast<const ZRRankingFeedback*>(&feedback)) return queryIdOf(f->sections);
     if (const auto* f = dynamic_cast<const ZRLateSectionsAppendedFeedback*>(&feedback)) return queryIdOf(f->sections);
     if (const auto* f = dynamic_cast<const ZRResultEngagementFeedback*>(&feedback)) return queryIdOf(f->result);
     if (const auto* f = dynamic_cast<const ZRVisibleResultsFeedback*>(&feedback)) return queryIdOf(f->results);
