@@ -1,6 +1,8 @@
 #include "tavrind/TavrinFeedback.h"
 
 #include "CoreTavrin/TAVRecordClasses.h"
+#include "tavrind/FeedbackJson.h"
+#include "tavrind/FeedbackProcessing.h"
 #include "tavrind/FeedbackTypes.h"
 #include "tavrind/TavrinSessionFeedback.h"
 
@@ -15,6 +17,55 @@ TavrinFeedback::TavrinFeedback(std::shared_ptr<ZRFeedback> feedback_, std::int64
 EventType TavrinFeedback::type() const
 {
     return feedback ? eventType(*feedback) : EventType::Unknown;
+}
+
+platform::Dictionary TavrinFeedback::_commonDictionary() const
+{
+    static const ZRFeedback kNothing;
+    const ZRFeedback& record = feedback ? *feedback : kNothing;
+    const EventType type = eventType(record);
+    platform::Dictionary event = feedbackDictionary(record, type);
+    if (requiresQueryId(type)) {
+        event.set("query_id", queryId);
+        if (clientQueryId != 0) event.set("client_query_id", clientQueryId);
+    }
+    event.set("type", eventTypeToString(type));
+    return event;
+}
+
+platform::Dictionary TavrinFeedback::dictionary() const
+{
+    platform::Dictionary event = _commonDictionary();
+    event.set("timestamp", relTimestamp);
+    return event;
+}
+
+std::string TavrinFeedback::description() const
+{
+    platform::Dictionary event = _commonDictionary();
+    event.set("timestamp", mach_duration_to_milliseconds(timestamp()));
+    return platform::toJson(std::move(event));
+}
+
+std::shared_ptr<TavrinFeedback> TavrinFeedback::processed(SessionProcessingHelper& helper) const
+{
+    auto event = std::make_shared<TavrinFeedback>(*this);
+    event->feedback = processedFeedback(feedback, helper);
+    return event;
+}
+
+bool TavrinFeedback::decodeField(std::string_view key, platform::Decoder& decoder)
+{
+    if (key != "feedback") return RecordOf::decodeField(key, decoder);
+    feedback = decoder.null() ? nullptr : std::dynamic_pointer_cast<ZRFeedback>(platform::decodeRecordIfKnown(decoder));
+    return true;
+}
+
+std::uint64_t mach_duration_to_milliseconds(std::uint64_t duration, HostTimebase timebase)
+{
+    if (timebase.denominator == 0) return 0;
+    const std::uint64_t nanoseconds = duration * timebase.numerator / timebase.denominator;
+    return static_cast<std::uint64_t>(static_cast<double>(nanoseconds) / 1'000'000);
 }
 
 const platform::RecordClasses& tavrindRecordClasses()

@@ -9,7 +9,16 @@
 
 namespace tavrin {
 
+class SessionProcessingHelper;
 enum class EventType : std::int64_t;
+
+/// Nanoseconds that make a tick of the host's clock, as a fraction.
+struct HostTimebase {
+    std::uint32_t numerator = 1;
+    std::uint32_t denominator = 1;
+};
+/// A distance of host ticks as whole milliseconds, the rest dropped. 0 for a timebase without a denominator.
+[[nodiscard]] std::uint64_t mach_duration_to_milliseconds(std::uint64_t duration, HostTimebase timebase = {});
 
 /// One event as the daemon keeps it: the record, and who sent it, for which query, and when. It is what session files
 /// hold. Plain data: its holder sees to it that one thread at a time writes it.
@@ -39,6 +48,17 @@ struct TavrinFeedback : platform::RecordOf<TavrinFeedback> {
         return a.timestamp() <=> b.timestamp();
     }
 
+    /// The event as it is uploaded; docs/feedback.md shows one of each type. Values are shared with the record where
+    /// they are of its own making (headers, features, ready-made JSON).
+    [[nodiscard]] platform::Dictionary dictionary() const;
+    /// The event as one line of JSON for logs and listeners, its "timestamp" the record's own, in milliseconds of the
+    /// host's clock.
+    [[nodiscard]] std::string description() const;
+    /// The event as it may leave the device: identifiers of results and suggestions are replaced, and `helper` knows of
+    /// those that it shows or refers to. This event and its record stay as they are; what holds no identifier is shared
+    /// with them.
+    [[nodiscard]] std::shared_ptr<TavrinFeedback> processed(SessionProcessingHelper& helper) const;
+
     static constexpr auto fields()
     {
         using Self = TavrinFeedback;
@@ -47,6 +67,12 @@ struct TavrinFeedback : platform::RecordOf<TavrinFeedback> {
             platform::field("timestamp", &Self::relTimestamp), platform::field("user_guid", &Self::userGuid),
             platform::field("user_agent", &Self::userAgent),   platform::field("_clientQueryId", &Self::clientQueryId)};
     }
+    /// As for any record, but a record in "feedback" that is none of an event reads as null.
+    bool decodeField(std::string_view key, platform::Decoder& decoder) override;
+
+private:
+    /// All of `dictionary()` but the timestamp, which comes last.
+    [[nodiscard]] platform::Dictionary _commonDictionary() const;
 };
 
 /// Every record that a session file may hold: the daemon's own and those that cross IPC. Clients can't send the
