@@ -79,41 +79,45 @@ void syncDirectory(const fs::path& directory)
 
 class SystemAppendFile final : public AppendFile {
 public:
+    /// `file` is new, and nobody else's.
     explicit SystemAppendFile(FileHandle file) : _file(std::move(file)) {}
 
-    Result<std::uint64_t> size() override
-    {
-        struct stat status {};
-        if (fstat(_file.fd(), &status) != 0) return std::unexpected(Error::posix(errno));
-        return static_cast<std::uint64_t>(status.st_size);
-    }
+    std::uint64_t size() const override { return _size; }
 
     Result<void> append(std::initializer_list<std::string_view> parts) override
     {
-        const auto before = size();
-        if (!before) return std::unexpected(before.error());
-        std::vector<iovec> rest;
-        for (const std::string_view part : parts) rest.push_back({const_cast<char*>(part.data()), part.size()});
-        for (std::span<iovec> left = rest; !left.empty();) {
+        if (_broken) return std::unexpected(Error::posix(EIO, "ends in a half-written record"));
+        std::array<iovec, kMaximumParts> rest;
+        std::size_t count = 0;
+        std::uint64_t total = 0;
+        for (const std::string_view part : parts) {
+            rest.at(count++) = {const_cast<char*>(part.data()), part.size()};
+            total += part.size();
+        }
+        for (std::span<iovec> left(rest.data(), count); !left.empty();) {
             const ssize_t written =
                 retried([&] { return writev(_file.fd(), left.data(), static_cast<int>(left.size())); });
             if (written < 0) {
                 const int error = errno;
-                if (ftruncate(_file.fd(), static_cast<off_t>(*before)) != 0) return std::unexpected(Error::posix(errno, "cutting off a half-written record"));
+                if (ftruncate(_file.fd(), static_cast<off_t>(_size)) != 0) _broken = true;
                 return std::unexpected(Error::posix(error));
             }
-            auto count = static_cast<std::size_t>(written);
-            while (!left.empty() && count >= left.front().iov_len) {
-                count -= left.front().iov_len;
+            auto done = static_cast<std::size_t>(written);
+            while (!left.empty() && done >= left.front().iov_len) {
+                done -= left.front().iov_len;
                 left = left.subspan(1);
             }
-            if (count > 0) left.front() = {static_cast<char*>(left.front().iov_base) + count, left.front().iov_len - count};
+            if (done > 0) left.front() = {static_cast<char*>(left.front().iov_base) + done, left.front().iov_len - done};
         }
+        _size += total;
         return {};
     }
 
 private:
+    static constexpr std::size_t kMaximumParts = 4;
     FileHandle _file;
+    std::uint64_t _size = 0;
+    bool _broken = false; // ends in a half-written record that could not be cut off
 };
 
 class SystemFiles final : public FileSystem {

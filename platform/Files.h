@@ -44,9 +44,10 @@ class AppendFile {
 public:
     virtual ~AppendFile() = default;
     /// Bytes in the file.
-    [[nodiscard]] virtual Result<std::uint64_t> size() = 0;
-    /// Adds the bytes of `parts`, one behind the other, in one go. After a failure the file is as long as it was
-    /// before: what was written of a record is cut off again. Not synced.
+    [[nodiscard]] virtual std::uint64_t size() const = 0;
+    /// Adds the bytes of `parts` (four at most), one behind the other, in one go. After a failure the file is as long as
+    /// it was before: what was written of a record is cut off again, and if that fails too nothing more is added. Not
+    /// synced.
     [[nodiscard]] virtual Result<void> append(std::initializer_list<std::string_view> parts) = 0;
 };
 

@@ -6,7 +6,9 @@
 namespace tavrin {
 
 Assembly::Assembly(platform::Device& device_)
-    : device(device_), diagnosticData(device_.counters), userDefaults(device_.userDefaults), fileManager(device_.files),
+    : device(device_), diagnosticData(device_.counters),
+      feedbackBooks(device_.files, device_.directories.state / "com.quorvane.tavrind" / "feedback-books.json"),
+      userDefaults(device_.userDefaults), fileManager(device_.files),
       notificationCenter(device_.notifications), sharedSession(device_.userDefaults.boolean("TAVSharedSession"))
 {}
 

@@ -2,10 +2,12 @@
 
 #include <memory>
 
+#include "tavrind/FeedbackBooks.h"
 #include "tavrind/TavrinDiagnosticDataReporter.h"
 
 namespace platform {
 struct Device;
+class BackgroundSession;
 class FileSystem;
 class NotificationCenter;
 class UrlSession;
@@ -41,11 +43,12 @@ struct Assembly {
 
     platform::Device& device;
     TavrinDiagnosticDataReporter diagnosticData;
+    FeedbackBooks feedbackBooks;
 
     std::shared_ptr<platform::UrlSession> urlSession;         ///< foreground: every request of a client
     std::shared_ptr<platform::UrlSession> bagSession;         ///< without caching
     std::shared_ptr<platform::UrlSession> downloadURLSession; ///< resources
-    std::shared_ptr<platform::UrlSession> uploadURLSession;   ///< feedback
+    std::shared_ptr<platform::BackgroundSession> uploadURLSession; ///< feedback
     platform::UserDefaults& userDefaults;
     platform::FileSystem& fileManager;
     platform::NotificationCenter& notificationCenter;

@@ -1,23 +1,66 @@
 #pragma once
 
+#include <atomic>
 #include <functional>
+#include <memory>
+#include <mutex>
+#include <set>
+
+#include "platform/BackgroundSession.h"
+
+namespace platform {
+class Activity;
+class Queue;
+} // namespace platform
 
 namespace tavrin {
 
 struct Assembly;
+class TavrinFeedbackFlusher;
 
-/// Uploads closed sessions from time to time, or on demand. There are none. Any thread.
-class BackgroundActivitiesManager {
+/// Uploads what waits in closed session files: every ten minutes as a background activity, or on demand. It is told by
+/// the upload session what became of the uploads.
+///
+/// A pass reads each file, deletes it, whether it could be read or not, and hands its session to the flusher: a file is
+/// never read twice. Passes run one at a time. Any thread.
+class BackgroundActivitiesManager : public platform::BackgroundSessionDelegate,
+                                    public std::enable_shared_from_this<BackgroundActivitiesManager> {
 public:
-    explicit BackgroundActivitiesManager(Assembly& assembly) : _assembly(assembly) {}
-    /// Runs one pass, then calls back.
-    void insertFlushActivity(std::move_only_function<void()> callback)
-    {
-        if (callback) callback();
-    }
+    /// Registers the background activity.
+    static std::shared_ptr<BackgroundActivitiesManager> make(Assembly& assembly);
+    explicit BackgroundActivitiesManager(Assembly& assembly);
+    ~BackgroundActivitiesManager() override;
+
+    /// Runs one pass, soon, then calls back.
+    void insertFlushActivity(std::move_only_function<void()> callback);
+    /// While stopped, the background activity does nothing; passes on demand still run.
+    [[nodiscard]] bool stopFlushing() const { return _stopFlushing; }
+    void setStopFlushing(bool stop) { _stopFlushing = stop; }
+
+    [[nodiscard]] const std::shared_ptr<TavrinFeedbackFlusher>& feedbackFlusher() const { return _feedbackFlusher; }
+    /// Books the uploads that an earlier process left under way; once the upload session is there.
+    void findUploads();
+
+    void taskDidSendBodyData(const std::shared_ptr<platform::BackgroundTask>& task, std::uint64_t sent,
+                             std::uint64_t expected) override;
+    void taskDidComplete(const std::shared_ptr<platform::BackgroundTask>& task,
+                         const std::optional<platform::UrlResponse>& response,
+                         const std::optional<platform::Error>& error) override;
+    void sessionDidFinishEvents() override;
+    void sessionDidBecomeInvalid(const platform::Error& error) override;
 
 private:
-    [[maybe_unused]] Assembly& _assembly;
+    void _runActivity(const std::shared_ptr<platform::Activity>& activity);
+    void _flusherActivity();
+    void _flushToWire(TavrinFeedbackFlusher& flusher);
+    void _findUpload(const platform::BackgroundTask& task);
+
+    Assembly& _assembly;
+    std::shared_ptr<platform::Queue> _queueFlusher;
+    std::shared_ptr<TavrinFeedbackFlusher> _feedbackFlusher;
+    std::atomic<bool> _stopFlushing = false;
+    std::mutex _foundMutex;
+    std::set<std::uint64_t> _found; ///< tasks of earlier processes that are in the books
 };
 
 } // namespace tavrin

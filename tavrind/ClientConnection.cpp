@@ -102,7 +102,7 @@ std::shared_ptr<ClientState> ClientConnection::_boundState() const
     return _state;
 }
 
-std::string ClientConnection::_userAgent() const
+std::string ClientConnection::userAgent() const
 {
     std::lock_guard lock(_mutex);
     return _configuration ? _configuration->userAgent.value_or("") : "";
@@ -149,7 +149,7 @@ void ClientConnection::configure(std::shared_ptr<TAVSessionConfiguration> config
         return reply.abandon();
     }
 
-    const std::string userAgent = _userAgent();
+    const std::string userAgent = this->userAgent();
     _state->bag(
         userAgent,
         BagReply([weak = weak_from_this(), userAgent](std::shared_ptr<const TAVBag> bag, const OptionalError& error) {
@@ -189,7 +189,7 @@ void ClientConnection::bag(BagReply reply)
 {
     _ensureState();
     if (!_state) return reply(nullptr, makeTAVError(TAVErrorInvalidResponse, "client state nil"));
-    _state->bag(_userAgent(), std::move(reply));
+    _state->bag(userAgent(), std::move(reply));
 }
 
 void ClientConnection::_completeDefaults(TAVRequest& request) const
@@ -302,7 +302,7 @@ void ClientConnection::reportEvent(std::shared_ptr<ZRFeedback> feedback, std::in
             _assembly.diagnosticData.addValue(1, createCounterKey(*shortName, "tavrin.engagements"));
     }
     manager->addTavrinFeedback(
-        std::make_shared<TavrinFeedback>(std::move(feedback), queryId, "", _userAgent(), clientQueryId));
+        std::make_shared<TavrinFeedback>(std::move(feedback), queryId, "", userAgent(), clientQueryId));
 }
 
 void ClientConnection::handleCustomFeedback(std::shared_ptr<ZRCustomFeedback> feedback, std::int64_t queryId,
@@ -311,7 +311,7 @@ void ClientConnection::handleCustomFeedback(std::shared_ptr<ZRCustomFeedback> fe
     switch (static_cast<std::int64_t>(feedback->feedbackType)) {
     case 1:
     case 3:
-        ClientSession(_assembly, std::make_shared<TavrinFeedback>(std::move(feedback), queryId, "", _userAgent()))
+        ClientSession(_assembly, std::make_shared<TavrinFeedback>(std::move(feedback), queryId, "", userAgent()))
             .sessionComplete();
         return callback();
     case 2:
@@ -375,7 +375,7 @@ void ClientConnection::flushSessionInvalidation(std::move_only_function<void(boo
     const auto state = _boundState();
     const auto manager = state ? state->sessionManager() : nullptr;
     if (!manager) return callback(false);
-    manager->flushSessionInvalidation(_userAgent(), std::move(callback));
+    manager->flushSessionInvalidation(userAgent(), std::move(callback));
 }
 
 } // namespace tavrin

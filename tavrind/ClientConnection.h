@@ -52,11 +52,12 @@ public:
     [[nodiscard]] std::int64_t currentQueryId() const { return _currentQueryId; }
     /// Short name of the client; none before it configured, or for a client without one.
     [[nodiscard]] std::optional<std::string> clientShortName() const;
+    /// Empty before the client has configured.
+    [[nodiscard]] std::string userAgent() const;
 
 private:
     void _ensureState();
     [[nodiscard]] std::shared_ptr<ClientState> _boundState() const;
-    [[nodiscard]] std::string _userAgent() const;
     void _completeDefaults(TAVRequest& request) const;
     void search(std::shared_ptr<TAVSearchRequest> request, RequestReply reply);
     void reportEvent(std::shared_ptr<ZRFeedback> feedback, std::int64_t queryId);

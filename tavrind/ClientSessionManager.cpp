@@ -1,38 +1,280 @@
 #include "tavrind/ClientSessionManager.h"
 
+#include <algorithm>
+#include <initializer_list>
+#include <iterator>
+#include <optional>
+
+#include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVSessionConfiguration.h"
 #include "platform/Clock.h"
 #include "platform/Device.h"
 #include "searchrecords/ZRErrorFeedback.h"
 #include "tavrind/Assembly.h"
+#include "tavrind/BackgroundActivitiesManager.h"
+#include "tavrind/ClientSession.h"
+#include "tavrind/ClientSessionShared.h"
+#include "tavrind/FeedbackBooks.h"
+#include "tavrind/FeedbackTypes.h"
+#include "tavrind/TavrinBagController.h"
 #include "tavrind/TavrinFeedback.h"
 #include "tavrind/TavrinLogging.h"
+#include "tavrind/TavrinSessionFeedback.h"
 #include "tavrind/TavrinUserGUIDController.h"
 
 namespace tavrin {
 
-ClientSessionManager::ClientSessionManager(Assembly& assembly, std::shared_ptr<TavrinUserGUIDController> guidController,
-                                           std::string identifier)
-    : _assembly(assembly), _guidController(std::move(guidController)), _identifier(std::move(identifier))
+using namespace std::chrono_literals;
+
+namespace {
+
+constexpr platform::Duration kSoftLimit = 10min;
+constexpr platform::Duration kFromSoftLimitToMaxTime = 5min;
+constexpr std::chrono::seconds kIdleTime = 180s;
+
+const platform::Log& log()
 {
-    const platform::Log& log = TavrinLogForCategory(kLogSession);
-    if (assembly.sharedSession)
-        log.log("Tavrin is using shared session for all clients {}", _identifier);
-    else
-        log.log("Tavrin is using individual session for clients {}", _identifier);
+    return TavrinLogForCategory(kLogSession);
 }
 
-void ClientSessionManager::addTavrinFeedback(std::shared_ptr<TavrinFeedback>) {}
+} // namespace
 
-void ClientSessionManager::flushSession(std::move_only_function<void()> callback)
+/// An event on its way through the state machine.
+struct ClientSessionManager::Occasion {
+    std::shared_ptr<TavrinFeedback> feedback;
+    std::move_only_function<void()> callback;
+};
+
+struct ClientSessionManager::Transition {
+    SessionEvent event;
+    std::initializer_list<SessionState> states; ///< in which it acts; in others the event is ignored
+    void (ClientSessionManager::*action)(Occasion&);
+    std::optional<SessionState> next; ///< none: the state stays
+};
+
+using enum SessionState;
+constexpr std::initializer_list<SessionState> kAnyState{Open, SoftLimit, None};
+constexpr std::initializer_list<SessionState> kInSession{Open, SoftLimit};
+constexpr std::initializer_list<SessionState> kWhenOpen{Open};
+constexpr std::initializer_list<SessionState> kAtSoftLimit{SoftLimit};
+constexpr std::initializer_list<SessionState> kWithoutSession{None};
+
+const ClientSessionManager::Transition ClientSessionManager::kTransitions[] = {
+    // event                        acts in          action                                          next
+    {SessionEvent::AddFeedback,     kInSession,      &ClientSessionManager::_add,                    {}},
+    {SessionEvent::AddFeedback,     kWithoutSession, &ClientSessionManager::_begin,                  Open},
+    {SessionEvent::SoftLimit,       kWhenOpen,       &ClientSessionManager::_nothing,                SoftLimit},
+    {SessionEvent::MaxTime,         kAtSoftLimit,    &ClientSessionManager::_endMaxTime,             None},
+    {SessionEvent::ExternalFlush,   kAnyState,       &ClientSessionManager::_endExternal,            None},
+    {SessionEvent::MemoryWarning,   kAnyState,       &ClientSessionManager::_requestFlush,           {}},
+    {SessionEvent::CriticalMemory,  kAnyState,       &ClientSessionManager::_endCriticalMemory,      None},
+    {SessionEvent::MemoryNormal,    kAnyState,       &ClientSessionManager::_requestFlush,           {}},
+    {SessionEvent::Idle,            kAtSoftLimit,    &ClientSessionManager::_endIdleAndBegin,        Open},
+    {SessionEvent::GuidChanged,     kInSession,      &ClientSessionManager::_endGuidChangedAndBegin, Open},
+    {SessionEvent::Engagement,      kAtSoftLimit,    &ClientSessionManager::_endEngagement,          None},
+};
+
+ClientSessionManager::ClientSessionManager(Assembly& assembly, std::shared_ptr<TavrinUserGUIDController> guidController,
+                                           std::string identifier)
+    : _assembly(assembly), _guidController(std::move(guidController)), _identifier(std::move(identifier)),
+      _sessionQueue(assembly.device.serialQueue("com.quorvane.tavrind.clientSessionManagerQueue"))
 {
+    if (assembly.sharedSession)
+        log().log("Tavrin is using shared session for all clients {}", _identifier);
+    else
+        log().log("Tavrin is using individual session for clients {}", _identifier);
+}
+
+ClientSessionManager::~ClientSessionManager() = default;
+
+void ClientSessionManager::addTavrinFeedback(std::shared_ptr<TavrinFeedback> feedback)
+{
+    _sessionQueue->async([self = shared_from_this(), feedback = std::move(feedback)]() mutable {
+        self->_takeFeedback(std::move(feedback));
+    });
+}
+
+bool ClientSessionManager::_wantsFeedback(const TavrinFeedback& feedback) const
+{
+    const auto bag = _assembly.bagController ? _assembly.bagController->currentBag() : nullptr;
+    return !bag || TAVBag(bag->rawBag(), feedback.userAgent).feedbackEnabled();
+}
+
+void ClientSessionManager::_takeFeedback(std::shared_ptr<TavrinFeedback> feedback)
+{
+    if (!_wantsFeedback(*feedback)) return _assembly.feedbackBooks.record(FeedbackFate::FeedbackOff);
+    const platform::Uuid guid = _guidController->currentUserGUID();
+    feedback->userGuid = guid.string();
+
+    const platform::Date now = _assembly.device.clock.wallNow();
+    const EventType type = feedback->type();
+    auto event = SessionEvent::AddFeedback;
+    if (_session && _session->userGuid() != guid)
+        event = SessionEvent::GuidChanged;
+    else if (_currentState == SoftLimit && (type == EventType::ResultEngagement || type == EventType::CardEngagement))
+        event = SessionEvent::Engagement;
+    else if (_currentState == SoftLimit && _expirationTime <= now)
+        event = SessionEvent::Idle;
+    _updateState(std::move(feedback), event);
+    _expirationTime = now + kIdleTime;
+}
+
+void ClientSessionManager::_updateState(std::shared_ptr<TavrinFeedback> feedback, SessionEvent event,
+                                        std::move_only_function<void()> callback)
+{
+    _sessionQueue->assertOnQueue();
+    Occasion occasion{std::move(feedback), std::move(callback)};
+    for (const Transition& transition : kTransitions) {
+        if (transition.event != event || std::ranges::find(transition.states, _currentState) == transition.states.end())
+            continue;
+        (this->*transition.action)(occasion);
+        if (transition.next) _currentState = *transition.next;
+        return;
+    }
+    log().debug("External event received {}", static_cast<unsigned>(event));
+}
+
+void ClientSessionManager::_nothing(Occasion&) {}
+
+void ClientSessionManager::_add(Occasion& occasion)
+{
+    _session->addFeedback(std::move(occasion.feedback));
+}
+
+void ClientSessionManager::_begin(Occasion& occasion)
+{
+    _setNewSession(std::move(occasion.feedback));
+}
+
+void ClientSessionManager::_endMaxTime(Occasion&)
+{
+    _flushSessionWithReason(SessionEndReason::MaxSessionTime, [this] {
+        log().log("session flushed because max timer expired {}", _identifier);
+    });
+}
+
+void ClientSessionManager::_endExternal(Occasion& occasion)
+{
+    _flushSessionWithReason(SessionEndReason::ExternalRequest, std::move(occasion.callback));
+}
+
+void ClientSessionManager::_requestFlush(Occasion&)
+{
+    if (_assembly.backgroundFlusher) _assembly.backgroundFlusher->insertFlushActivity({});
+}
+
+void ClientSessionManager::_endCriticalMemory(Occasion& occasion)
+{
+    _flushSessionWithReason(SessionEndReason::CriticalMemory,
+                            [] { log().log("session flushed because of critical memory"); });
+    _requestFlush(occasion);
+}
+
+void ClientSessionManager::_endIdleAndBegin(Occasion& occasion)
+{
+    _flushSessionWithReason(SessionEndReason::SessionIdle, [this] {
+        log().log("session flushed because soft limit reached and idle time was beyond {} {}", kIdleTime.count(),
+                  _identifier);
+    });
+    _guidController->reset();
+    occasion.feedback->userGuid = _guidController->currentUserGUID().string();
+    _setNewSession(std::move(occasion.feedback));
+}
+
+void ClientSessionManager::_endGuidChangedAndBegin(Occasion& occasion)
+{
+    _flushSessionWithReason(SessionEndReason::GuidChanged,
+                            [this] { log().log("session flushed because guid changed {}", _identifier); });
+    _setNewSession(std::move(occasion.feedback));
+}
+
+void ClientSessionManager::_endEngagement(Occasion& occasion)
+{
+    _session->addFeedback(std::move(occasion.feedback));
+    _flushSessionWithReason(SessionEndReason::EngagementReceived, [] {
+        log().log("session flushed because soft limit reached and sentinel feedback received");
+    });
+    _guidController->reset();
+}
+
+void ClientSessionManager::_setNewSession(std::shared_ptr<TavrinFeedback> feedback)
+{
+    const std::uint64_t counter = ++_sessionCounter;
+    const auto previousReason = static_cast<std::int64_t>(_flushReason);
+    if (_assembly.sharedSession)
+        _session = std::make_shared<ClientSessionShared>(_assembly, std::move(feedback), previousReason);
+    else
+        _session = std::make_shared<ClientSession>(_assembly, std::move(feedback), previousReason);
+    log().log("new session id {} {}", counter, _identifier);
+
+    _sessionQueue->after(kSoftLimit, [weak = weak_from_this(), counter] {
+        const auto self = weak.lock();
+        if (!self) return;
+        log().debug("soft limit reached expected {} current {} {}", counter, self->_sessionCounter, self->_identifier);
+        if (self->_sessionCounter == counter) self->_onUserGuidSoftLimitReached();
+    });
+}
+
+void ClientSessionManager::_onUserGuidSoftLimitReached()
+{
+    if (!_session) return;
+    _updateState(nullptr, SessionEvent::SoftLimit);
+    log().log("soft limit reached, maxtimer session id {} {}", _sessionCounter, _identifier);
+    _sessionQueue->after(kFromSoftLimitToMaxTime, [weak = weak_from_this(), counter = _sessionCounter] {
+        const auto self = weak.lock();
+        if (!self) return;
+        log().debug("max timer expired expected {} current {}", counter, self->_sessionCounter);
+        if (self->_sessionCounter == counter && self->_session) self->_updateState(nullptr, SessionEvent::MaxTime);
+    });
+}
+
+void ClientSessionManager::_flushSessionWithReason(SessionEndReason reason, std::move_only_function<void()> callback)
+{
+    _sessionQueue->assertOnQueue();
+    if (_session) {
+        _flushReason = reason;
+        const std::uint64_t now = _assembly.device.clock.hostTicks();
+        std::exchange(_session, nullptr)->enumerateSessions([&](ClientSession& session, bool) {
+            auto end = std::make_shared<TavrinSessionEndFeedback>(reason);
+            end->timestamp = now;
+            session.addFeedback(std::make_shared<TavrinFeedback>(std::move(end), 0, session.userGuid().string(),
+                                                                 session.agent()));
+            session.sessionComplete();
+        });
+    }
     if (callback) callback();
 }
 
-void ClientSessionManager::flushSessionInvalidation(const std::string&, std::move_only_function<void(bool)> callback)
+std::shared_ptr<Session> ClientSessionManager::session()
 {
-    if (_assembly.sharedSession) return callback(false);
-    flushSession([callback = std::move(callback)]() mutable { callback(true); });
+    return _sessionQueue->sync([this] { return _session; });
+}
+
+SessionState ClientSessionManager::currentState()
+{
+    return _sessionQueue->sync([this] { return _currentState; });
+}
+
+platform::Date ClientSessionManager::expirationTime()
+{
+    return _sessionQueue->sync([this] { return _expirationTime; });
+}
+
+void ClientSessionManager::flushSession(std::move_only_function<void()> callback)
+{
+    _sessionQueue->async([self = shared_from_this(), callback = std::move(callback)]() mutable {
+        self->_updateState(nullptr, SessionEvent::ExternalFlush, std::move(callback));
+    });
+}
+
+void ClientSessionManager::flushSessionInvalidation(const std::string& userAgent,
+                                                    std::move_only_function<void(bool)> callback)
+{
+    if (!_assembly.sharedSession) return flushSession([callback = std::move(callback)]() mutable { callback(true); });
+    auto record = std::make_shared<TavrinConnectionInvalidated>();
+    record->timestamp = _assembly.device.clock.hostTicks();
+    addTavrinFeedback(std::make_shared<TavrinFeedback>(std::move(record), 0, "", userAgent));
+    callback(false);
 }
 
 const std::string& ClientSessionManager::tavrindUserAgent()

@@ -3,6 +3,7 @@
 #include <cstdlib>
 
 #include "CoreTavrin/TAVProtocols.h"
+#include "platform/BackgroundSession.h"
 #include "platform/Device.h"
 #include "platform/Log.h"
 #include "platform/NotificationCenter.h"
@@ -65,15 +66,21 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device)
     assembly.subscriptionManager = std::make_shared<TavrinSubscriptionManager>(assembly, assembly.requestFactory);
     assembly.downloadManager = std::make_shared<DownloadManager>(assembly);
     assembly.persistentStorage = std::make_shared<TavrinPersistentStorage>(assembly);
-    assembly.crowdsourcingFeedbackFlusher = std::make_shared<TavrinFeedbackFlusher>(assembly, 0);
-    assembly.backgroundFlusher = std::make_shared<BackgroundActivitiesManager>(assembly);
+    assembly.crowdsourcingFeedbackFlusher = TavrinFeedbackFlusher::make(assembly, 0);
+    assembly.backgroundFlusher = BackgroundActivitiesManager::make(assembly);
     assembly.downloadURLSession =
         device.urlLoader.makeSession({.caFile = caFile()}, sessionQueue("com.quorvane.tavrind.downloadSession"));
     assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.launch");
     assembly.bagSession = device.urlLoader.makeSession({.connectionPurgeTimeout = 10s, .caFile = caFile()},
                                                        sessionQueue("com.quorvane.tavrind.bagSession"));
-    assembly.uploadURLSession = device.urlLoader.makeSession({.requestTimeout = 300s, .caFile = caFile()},
-                                                             sessionQueue("com.quorvane.tavrind.uploadSession"));
+    assembly.uploadURLSession =
+        device.backgroundSessions.make({.identifier = "com.quorvane.tavrind.flusher.nsurlsession",
+                                        .requestTimeout = 300s,
+                                        .resourceTimeout = std::chrono::days(7),
+                                        .caFile = caFile()},
+                                       assembly.backgroundFlusher,
+                                       device.serialQueue("com.quorvane.tavrind.uploadSession"));
+    assembly.backgroundFlusher->findUploads();
     assembly.lookup = std::make_shared<Lookup>(assembly);
     assembly.bagController = TavrinBagController::make(assembly);
     assembly.clientStateManager = ClientStateManager::make(assembly);

@@ -1,8 +1,65 @@
 #include "tavrind/TavrinFeedbackFlusher.h"
 
+#include <cerrno>
+
+#include "CoreTavrin/TAVBag.h"
+#include "platform/BackgroundSession.h"
+#include "platform/Device.h"
+#include "platform/Files.h"
+#include "platform/Queue.h"
+#include "platform/Uuid.h"
+#include "searchrecords/ZRViewFeedback.h"
+#include "tavrind/Assembly.h"
+#include "tavrind/CompressedOutputStream.h"
+#include "tavrind/FeedbackBooks.h"
+#include "tavrind/mmap_file.h"
+#include "tavrind/TAVNetworkRequestFactory.h"
+#include "tavrind/TavrinBagController.h"
+#include "tavrind/TavrinLogging.h"
+
 namespace tavrin {
 
-std::string_view convertIdentifierToString(std::uint64_t identifier)
+using namespace std::chrono_literals;
+using platform::Value;
+
+namespace {
+
+constexpr platform::Duration kUploadTimeout = 300s;
+constexpr std::size_t kMaximumPath = 1024;
+constexpr int kMaximumNameAttempts = 16;
+
+const platform::Log& log()
+{
+    return TavrinLogForCategory(kLogFlusher);
+}
+
+/// A record that goes out on its own, in the JSON that its client made.
+class CustomFeedbackToSend final : public Flushable {
+public:
+    explicit CustomFeedbackToSend(std::shared_ptr<ZRCustomFeedback> record) : _record(std::move(record)) {}
+    FeedbacksToSend getFeedbacksToSend() override { return {.rest = _record->jsonFeedback}; }
+    [[nodiscard]] std::size_t recordedEvents() const override { return 1; }
+
+private:
+    std::shared_ptr<ZRCustomFeedback> _record;
+};
+
+/// A new file of an unguessed name, open.
+platform::Result<std::unique_ptr<platform::AppendFile>> makeTemporaryFile(platform::FileSystem& files,
+                                                                          const std::filesystem::path& directory,
+                                                                          std::filesystem::path& path)
+{
+    for (int attempt = 0;; ++attempt) {
+        path = directory / ("flusher_" + platform::Uuid::random().string().substr(0, 6));
+        if (path.native().size() >= kMaximumPath) return std::unexpected(platform::Error::posix(ENAMETOOLONG));
+        auto file = files.createForAppending(path);
+        if (file || file.error().code != EEXIST || attempt == kMaximumNameAttempts) return file;
+    }
+}
+
+} // namespace
+
+std::string_view convertIdentifierToString(std::int64_t identifier)
 {
     switch (identifier) {
     case 0: return "crowdsourcing";
@@ -11,9 +68,255 @@ std::string_view convertIdentifierToString(std::uint64_t identifier)
     }
 }
 
-void TavrinFeedbackFlusher::flush(std::shared_ptr<ZRFeedback>, std::move_only_function<void()> callback)
+Value UploadNote::value() const
 {
-    if (callback) callback();
+    return Value::dictionaryOf(
+        {{"flusher", flusher}, {"feedbacks", feedbacks}, {"events", events}, {"process", process}});
+}
+
+UploadNote UploadNote::from(const Value& value)
+{
+    return {.flusher = value["flusher"].asInt().value_or(-1),
+            .feedbacks = value["feedbacks"].asInt().value_or(0),
+            .events = value["events"].asUInt().value_or(0),
+            .process = value["process"].asString() ? *value["process"].asString() : ""};
+}
+
+bool writeJson(FeedbacksToSend& feedbacks, OutputStream& stream)
+{
+    if (!feedbacks.rest.asDictionary()) return false;
+    const auto write = [&stream](std::string_view text) { return stream.write(text) >= 0; };
+    if (!feedbacks.nextEvent) return write(platform::toJson(feedbacks.rest));
+
+    bool good = write(R"({"fb":[)");
+    bool first = true;
+    while (good) {
+        auto event = feedbacks.nextEvent();
+        if (!event) break;
+        good = (std::exchange(first, false) || write(",")) && write(platform::toJson(std::move(*event)));
+    }
+    // What is behind "fb" goes on where it ends.
+    const std::string rest = platform::toJson(feedbacks.rest);
+    return good && write("]") && (feedbacks.rest.count() == 0 || write(",")) && write(std::string_view(rest).substr(1));
+}
+
+std::shared_ptr<TavrinFeedbackFlusher> TavrinFeedbackFlusher::make(Assembly& assembly, std::int64_t identifier)
+{
+    auto flusher = std::make_shared<TavrinFeedbackFlusher>(assembly, identifier);
+    flusher->_bagObserver = assembly.notificationCenter.observe(
+        TAVBagChangeNotification, [weak = flusher->weak_from_this()](const platform::Notification& notification) {
+            if (auto self = weak.lock())
+                self->bagChangeNotification(notification.get<std::shared_ptr<const TAVBag>>("bag"));
+        });
+    return flusher;
+}
+
+TavrinFeedbackFlusher::TavrinFeedbackFlusher(Assembly& assembly, std::int64_t identifier)
+    : _assembly(assembly), _identifier(identifier),
+      _queueBuffer(assembly.device.serialQueue("com.quorvane.tavrind.tavrinDataBufferQueue")),
+      _feedbackCountQueue(assembly.device.serialQueue("com.quorvane.tavrind.feedbackCountQueue"))
+{
+    log().log("Initialize flusher for {}", convertIdentifierToString(identifier));
+}
+
+TavrinFeedbackFlusher::~TavrinFeedbackFlusher() = default;
+
+void TavrinFeedbackFlusher::flush(std::shared_ptr<Flushable> object, std::move_only_function<void()> callback)
+{
+    _queueBuffer->async([self = shared_from_this(), object = std::move(object),
+                         callback = std::move(callback)]() mutable {
+        self->_sessionBuffer.push_back(std::move(object));
+        if (callback) callback();
+    });
+}
+
+void TavrinFeedbackFlusher::flush(std::shared_ptr<ZRCustomFeedback> record, std::move_only_function<void()> callback)
+{
+    _assembly.feedbackBooks.record(FeedbackFate::Open);
+    flush(std::static_pointer_cast<Flushable>(std::make_shared<CustomFeedbackToSend>(std::move(record))),
+          std::move(callback));
+}
+
+void TavrinFeedbackFlusher::flushSyncFromArray(std::vector<std::shared_ptr<Flushable>> objects)
+{
+    _queueBuffer->async([self = shared_from_this(), objects = std::move(objects)] {
+        self->_sessionBuffer.insert(self->_sessionBuffer.end(), objects.begin(), objects.end());
+    });
+}
+
+void TavrinFeedbackFlusher::dropFeedbacks()
+{
+    _queueBuffer->async([self = shared_from_this()] {
+        for (const auto& object : self->_sessionBuffer)
+            self->_assembly.feedbackBooks.move(FeedbackFate::Open, FeedbackFate::NotSent, object->recordedEvents());
+        self->_sessionBuffer.clear();
+    });
+}
+
+void TavrinFeedbackFlusher::flushToWireAsync(std::move_only_function<void(Bodies)> callback)
+{
+    _queueBuffer->async([self = shared_from_this(), callback = std::move(callback)]() mutable {
+        Bodies bodies = self->flushToWireWithObjectsReturned(static_cast<bool>(callback));
+        // The counter of accepted connections is this one, too.
+        self->_assembly.diagnosticData.addValue(static_cast<std::int64_t>(bodies.size()),
+                                                "com.quorvane.tavrind.clientconnection");
+        if (callback) callback(std::move(bodies));
+    });
+}
+
+TavrinFeedbackFlusher::Bodies TavrinFeedbackFlusher::flushToWireSync()
+{
+    return _queueBuffer->sync([this] { return flushToWireWithObjectsReturned(true); });
+}
+
+TavrinFeedbackFlusher::Bodies TavrinFeedbackFlusher::flushToWireWithObjectsReturned(bool returned)
+{
+    _queueBuffer->assertOnQueue();
+    log().info("Sessions Flushed {}", _sessionBuffer.size());
+    if (!_serverEndpoint && !_sessionBuffer.empty())
+        log().error("Server endpoint not set, data can't be sent to server");
+    Bodies bodies;
+    for (const auto& object : std::exchange(_sessionBuffer, {})) _flushObject(*object, returned ? &bodies : nullptr);
+    return bodies;
+}
+
+void TavrinFeedbackFlusher::_flushObject(Flushable& object, Bodies* bodies)
+{
+    const std::size_t events = object.recordedEvents();
+    const auto drop = [&](FeedbackFate why) { _assembly.feedbackBooks.move(FeedbackFate::Open, why, events); };
+
+    std::filesystem::path fpath;
+    auto file = makeTemporaryFile(_assembly.fileManager, _assembly.device.directories.temporary, fpath);
+    log().debug("flushing to {}", fpath.string());
+    if (!file) {
+        log().error("Error creating file to write feedbacks to disk");
+        return drop(FeedbackFate::NoBody);
+    }
+    CompressedOutputStream stream(std::make_unique<FileOutputStream>(std::move(*file)));
+    stream.open();
+    FeedbacksToSend feedbacks = object.getFeedbacksToSend();
+    const std::size_t count = feedbacks.count();
+    const bool written = writeJson(feedbacks, stream);
+    stream.close();
+    if (!written || stream.streamError()) {
+        const auto error = stream.streamError();
+        log().error("Invalid JSON Object {} error {}", error ? "" : platform::toJson(feedbacks.rest).substr(0, 200),
+                    error ? error->description() : "not a dictionary");
+        if (!error) return drop(FeedbackFate::NotJson);
+        (void)_assembly.fileManager.remove(fpath); // a full disk needs the room
+        return drop(FeedbackFate::NoBody);
+    }
+
+    const std::string digest = stream.dataDigestForStream();
+    if (bodies) _saveFile(fpath, *bodies);
+    if (_serverEndpoint)
+        _upload(fpath, digest, count, events);
+    else
+        drop(FeedbackFate::EndpointUnset);
+    if (const auto removed = _assembly.fileManager.remove(fpath); removed)
+        log().debug("File removed {}", fpath.string());
+    else
+        log().error("File Remove Error fpath {} error {}", fpath.string(), removed.error().description());
+}
+
+void TavrinFeedbackFlusher::_saveFile(const std::filesystem::path& fpath, Bodies& bodies)
+{
+    const auto file = _assembly.fileManager.openForReading(fpath);
+    if (!file) return log().error("open failed {}", file.error().description());
+    auto body = mmapFileHandle(*file);
+    if (!body) return log().error("mmap failed {}", body.error().description());
+    bodies.push_back(std::move(*body));
+}
+
+void TavrinFeedbackFlusher::_upload(const std::filesystem::path& fpath, const std::string& digest, std::size_t count,
+                                    std::size_t events)
+{
+    auto task = _assembly.uploadURLSession->uploadTask(
+        _assembly.requestFactory->flusherUploadRequest(*_serverEndpoint, kUploadTimeout, digest), fpath);
+    if (!task) {
+        log().error("Error creating Upload Task for fpath {}. Exception {} occurred for reason {}", fpath.string(),
+                    task.error().domain, task.error().reason());
+        return _assembly.feedbackBooks.move(FeedbackFate::Open, FeedbackFate::NoTask, events);
+    }
+    const auto feedbacks = static_cast<std::int64_t>(count);
+    (*task)->setNote(UploadNote{.flusher = _identifier,
+                                .feedbacks = feedbacks,
+                                .events = events,
+                                .process = _assembly.feedbackBooks.process()}
+                         .value());
+    setFeedbacksPerTask(**task, feedbacks);
+    _assembly.feedbackBooks.move(FeedbackFate::Open, FeedbackFate::Uploading, events);
+    (*task)->resume();
+}
+
+std::size_t TavrinFeedbackFlusher::countOfDatabuffer()
+{
+    return _queueBuffer->sync([this] { return _sessionBuffer.size(); });
+}
+
+std::vector<std::shared_ptr<Flushable>> TavrinFeedbackFlusher::sessionBuffer()
+{
+    return _queueBuffer->sync([this] { return _sessionBuffer; });
+}
+
+std::optional<platform::Url> TavrinFeedbackFlusher::serverEndpoint()
+{
+    return _queueBuffer->sync([this] { return _serverEndpoint; });
+}
+
+void TavrinFeedbackFlusher::setFeedbacksPerTask(const platform::BackgroundTask& task, std::int64_t count)
+{
+    _feedbackCountQueue->sync([&] { _feedbacksPerTask[task.identifier()] = count; });
+}
+
+void TavrinFeedbackFlusher::removeFeedbacksForTask(const platform::BackgroundTask& task)
+{
+    _feedbackCountQueue->sync([&] { _feedbacksPerTask.erase(task.identifier()); });
+}
+
+std::int64_t TavrinFeedbackFlusher::getFeedbackCountForTask(const platform::BackgroundTask& task)
+{
+    return _feedbackCountQueue->sync([&]() -> std::int64_t {
+        const auto found = _feedbacksPerTask.find(task.identifier());
+        if (found != _feedbacksPerTask.end()) return found->second;
+        const UploadNote note = UploadNote::from(task.note());
+        return note.flusher == _identifier ? note.feedbacks : 0;
+    });
+}
+
+std::map<std::uint64_t, std::int64_t> TavrinFeedbackFlusher::feedbacksPerTask()
+{
+    return _feedbackCountQueue->sync([this] { return _feedbacksPerTask; });
+}
+
+void TavrinFeedbackFlusher::setEndpoint(std::optional<platform::Url> endpoint)
+{
+    _queueBuffer->async([self = shared_from_this(), endpoint = std::move(endpoint)]() mutable {
+        if (endpoint && self->_identifier == 1) {
+            platform::UrlComponents components(*endpoint);
+            components.setPercentEncodedQuery("v=2");
+            endpoint = components.url();
+        }
+        self->_serverEndpoint = std::move(endpoint);
+        log().log("new endpoint: {}", self->_serverEndpoint ? self->_serverEndpoint->string() : "none");
+    });
+}
+
+/// Inside the bag controller's barrier.
+void TavrinFeedbackFlusher::bagChangeNotification(const std::shared_ptr<const TAVBag>& bag)
+{
+    log().log("bag change notification received");
+    if (bag) setEndpoint(_fetchEndpointFromBag(*bag));
+}
+
+std::optional<platform::Url> TavrinFeedbackFlusher::_fetchEndpointFromBag(const TAVBag& bag) const
+{
+    if (!bag.feedbackEnabled()) return std::nullopt;
+    switch (_identifier) {
+    case 0: return bag.crowdsourcingURL();
+    case 1: return bag.feedbackURL();
+    default: return std::nullopt;
+    }
 }
 
 } // namespace tavrin

@@ -1,45 +1,172 @@
 #include "tavrind/TavrinFlusherXPC.h"
 
+#include <utility>
+
 #include "platform/Device.h"
 #include "tavrind/Assembly.h"
+#include "tavrind/BackgroundActivitiesManager.h"
+#include "tavrind/ClientConnection.h"
+#include "tavrind/TavrinFeedback.h"
 #include "tavrind/TavrinLogging.h"
 
 namespace tavrin {
 
+namespace {
+
+const platform::Log& log()
+{
+    return TavrinLogForCategory(kLogFlusher);
+}
+
+/// One tool's connection: its commands reach the bridge with its own proxy.
+class ToolConnection final : public TAVFlusherXPC {
+public:
+    ToolConnection(std::weak_ptr<TavrinFlusherXPC> bridge, std::shared_ptr<TAVFlusherListener> tool)
+        : _bridge(std::move(bridge)), _tool(std::move(tool))
+    {}
+    void initiateConnectionWithIntent(std::uint64_t intent) override
+    {
+        if (const auto bridge = _bridge.lock()) bridge->initiateConnectionWithIntent(intent, _tool);
+    }
+
+private:
+    std::weak_ptr<TavrinFlusherXPC> _bridge;
+    std::shared_ptr<TAVFlusherListener> _tool;
+};
+
+/// Runs its function when the last holder lets go: when every flush of a dump has been done, or given up.
+std::shared_ptr<void> whenReleased(std::move_only_function<void()> function)
+{
+    auto shared = std::make_shared<std::move_only_function<void()>>(std::move(function));
+    return {nullptr, [shared](std::nullptr_t) { (*shared)(); }};
+}
+
+} // namespace
+
 std::shared_ptr<TavrinFlusherXPC> TavrinFlusherXPC::make(Assembly& assembly, GetClientConnections getClientConnections)
 {
     auto bridge = std::make_shared<TavrinFlusherXPC>(assembly, std::move(getClientConnections));
-    bridge->_listener->setAcceptor(
-        [weak = bridge->weak_from_this()](std::shared_ptr<platform::ipc::Connection> connection) {
-            connection->exportObject(flusherHandler(weak));
-            // The handler keeps the connection until it ends.
-            connection->setInvalidationHandler(
-                [connection] { TavrinLogForCategory(kLogFlusher).log("listener invalidated"); });
-            connection->resume();
+    bridge->_ipcListener->setAcceptor(
+        [weak = bridge->weak_from_this()](const std::shared_ptr<platform::ipc::Connection>& connection) {
+            if (const auto self = weak.lock()) self->_accept(connection);
         });
-    bridge->_listener->resume();
-    TavrinLogForCategory(kLogFlusher).log("started accepting connections :{}", bridge->endpoint());
+    bridge->_ipcListener->resume();
+    log().log("started accepting connections :{}", bridge->endpoint());
     return bridge;
 }
 
 TavrinFlusherXPC::TavrinFlusherXPC(Assembly& assembly, GetClientConnections getClientConnections)
     : _assembly(assembly), _getClientConnections(std::move(getClientConnections)),
-      _listener(assembly.device.ipc.anonymous(flusherInterface(), "com.quorvane.tavrind.flusherXPC"))
+      _ipcListener(assembly.device.ipc.anonymous(flusherInterface(), "com.quorvane.tavrind.flusherXPC"))
 {}
 
 TavrinFlusherXPC::~TavrinFlusherXPC()
 {
-    TavrinLogForCategory(kLogFlusher).log("stopped listening for TAVFlusherListener connections");
+    log().log("stopped listening for TAVFlusherListener connections");
 }
 
 std::string TavrinFlusherXPC::endpoint() const
 {
-    return _listener->endpoint();
+    return _ipcListener->endpoint();
 }
 
-void TavrinFlusherXPC::initiateConnectionWithIntent(std::uint64_t intent)
+void TavrinFlusherXPC::_accept(const std::shared_ptr<platform::ipc::Connection>& connection)
 {
-    TavrinLogForCategory(kLogFlusher).log("Unsupported command yet: {}", intent);
+    const Tool tool = makeFlusherListenerProxy(connection);
+    const auto commands = std::make_shared<ToolConnection>(weak_from_this(), tool);
+    connection->setPushErrorHandler([](const std::string& reason) { log().error("remote proxy error: {}", reason); });
+    connection->exportObject(flusherHandler(commands));
+    // The handler keeps the connection, and what it exports, until the connection ends.
+    connection->setInvalidationHandler([connection, commands, tool, weak = weak_from_this()] {
+        log().log("listener invalidated");
+        if (const auto self = weak.lock()) self->_removeDelegate(tool);
+    });
+    {
+        const std::lock_guard lock(_mutex);
+        _remoteObject = tool;
+    }
+    connection->resume();
+}
+
+void TavrinFlusherXPC::_removeDelegate(const Tool& tool)
+{
+    const std::lock_guard lock(_mutex);
+    if (_receivingStreamListener == tool) {
+        _receivingStreamListener = nullptr;
+        log().log("Removed receiving stream listener");
+    }
+    if (_sendingStreamListener == tool) {
+        _sendingStreamListener = nullptr;
+        log().log("Removed sending stream listener");
+    }
+    if (_remoteObject == tool) {
+        _remoteObject = nullptr;
+        log().log("Removed remote listener");
+    }
+}
+
+void TavrinFlusherXPC::initiateConnectionWithIntent(std::uint64_t intent, std::shared_ptr<TAVFlusherListener> tool)
+{
+    std::unique_lock lock(_mutex);
+    _remoteObject = tool;
+    switch (intent) {
+    case 0:
+        _sendingStreamListener = std::move(tool);
+        return log().log("new listener for flusher client sessions, delegate: {}",
+                         static_cast<const void*>(_sendingStreamListener.get()));
+    case 1:
+        _receivingStreamListener = std::move(tool);
+        return log().log("new listener for client feedbacks, delegate: {}", static_cast<const void*>(_receivingStreamListener.get()));
+    case 2:
+        lock.unlock();
+        log().log("flushing stopped; dump command will start flushing again");
+        _assembly.backgroundFlusher->setStopFlushing(true);
+        return tool->workDone();
+    case 3:
+        if (!_sendingStreamListener) {
+            log().log("no listener for sending stream setting this client as remote");
+            _sendingStreamListener = tool;
+        }
+        lock.unlock();
+        return _dump(tool);
+    default: log().log("Unsupported command yet: {}", intent);
+    }
+}
+
+void TavrinFlusherXPC::_dump(const Tool& tool)
+{
+    const auto done = whenReleased([&flusher = *_assembly.backgroundFlusher, tool] {
+        flusher.setStopFlushing(false);
+        tool->workDone();
+    });
+    if (!_getClientConnections) return;
+    for (const auto& connection : _getClientConnections()) {
+        connection->flushSession([flusher = _assembly.backgroundFlusher, agent = connection->userAgent(), done] {
+            log().log("session flushed because of dump command {}", agent);
+            flusher->insertFlushActivity([done] {});
+        });
+    }
+}
+
+TavrinFlusherXPC::Tool TavrinFlusherXPC::_listener(const Tool& role) const
+{
+    const std::lock_guard lock(_mutex);
+    return role;
+}
+
+void TavrinFlusherXPC::sendDataToSendingStreamListener(const platform::Bytes& body)
+{
+    if (const Tool listener = _listener(_sendingStreamListener)) listener->flushedData(body);
+}
+
+void TavrinFlusherXPC::sendDataToReceivingStreamListener(const TavrinFeedback& feedback)
+{
+    const Tool listener = _listener(_receivingStreamListener);
+    const bool logged = platform::Log::enabled(platform::LogLevel::Debug);
+    if (!listener && !logged) return;
+    const std::string description = feedback.description();
+    log().debug("id {} agent {} event {}", feedback.queryId, feedback.userAgent, description);
+    if (listener) listener->receivedFeedbackDescription(description);
 }
 
 } // namespace tavrin

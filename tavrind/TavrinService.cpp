@@ -149,6 +149,7 @@ Value TavrinService::status()
                                 {"sessions", _assembly.clientStateManager->sessions()},
                                 {"bag", std::move(bag)},
                                 {"transactions", std::move(transactions)},
+                                {"feedback", _assembly.feedbackBooks.description()},
                                 {"validImageHosts", std::move(hosts)}});
 }
 

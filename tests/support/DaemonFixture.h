@@ -64,8 +64,10 @@ struct DaemonTest : testing::Test {
         device.drain();
         device.loader.sessions.clear();
         daemon = startUp(device.device).value();
-        session = std::make_shared<RecordingSessionManager>(assembly());
-        assembly().clientSessionManager = session;
+        if (recordFeedback) {
+            session = std::make_shared<RecordingSessionManager>(assembly());
+            assembly().clientSessionManager = session;
+        }
         device.drain();
     }
 
@@ -142,6 +144,7 @@ struct DaemonTest : testing::Test {
 
     platform::test::TestDevice device;
     std::unique_ptr<Daemon> daemon;
+    bool recordFeedback = true; ///< in `session`, in place of real sessions
     std::shared_ptr<RecordingSessionManager> session;
 };
 

@@ -85,7 +85,7 @@ Result<FileHandle> MemoryFiles::openForReading(const fs::path& path)
 class MemoryFiles::Appending final : public AppendFile {
 public:
     Appending(MemoryFiles& files, fs::path path) : _files(files), _path(std::move(path)) {}
-    Result<std::uint64_t> size() override
+    std::uint64_t size() const override
     {
         std::lock_guard lock(_files._mutex);
         return _files.files[_path].size();

@@ -1,0 +1,177 @@
+#include "tavrind/BackgroundActivitiesManager.h"
+
+#include "platform/Device.h"
+#include "platform/Queue.h"
+#include "platform/Transactions.h"
+#include "tavrind/Assembly.h"
+#include "tavrind/ClientSession.h"
+#include "tavrind/FeedbackBooks.h"
+#include "tavrind/FileContainer.h"
+#include "tavrind/TavrinFeedbackFlusher.h"
+#include "tavrind/TavrinFlusherXPC.h"
+#include "tavrind/TavrinLogging.h"
+#include "tavrind/TavrinPersistentStorage.h"
+#include "tavrind/TavrinXPCActivity.h"
+
+namespace tavrin {
+
+using namespace std::chrono_literals;
+using platform::ActivityState;
+
+namespace {
+
+constexpr const char* kActivity = "com.quorvane.tavrind.flusher.background";
+constexpr std::chrono::seconds kDelay = 300s;
+constexpr std::chrono::seconds kInterval = 600s;
+constexpr std::chrono::seconds kGracePeriod = 300s;
+
+const platform::Log& log()
+{
+    return TavrinLogForCategory(kLogFlusher);
+}
+
+platform::ActivityCriteria criteria()
+{
+    platform::ActivityCriteria criteria = TavrinXPCCriteria::createCriteria();
+    TavrinXPCCriteria::setDelay(kDelay, criteria);
+    TavrinXPCCriteria::setInterval(kInterval, criteria);
+    TavrinXPCCriteria::setGracePeriod(kGracePeriod, criteria);
+    TavrinXPCCriteria::setRepeating(true, criteria);
+    TavrinXPCCriteria::setAllowBatteryUsage(true, criteria);
+    return criteria;
+}
+
+} // namespace
+
+std::shared_ptr<BackgroundActivitiesManager> BackgroundActivitiesManager::make(Assembly& assembly)
+{
+    auto manager = std::make_shared<BackgroundActivitiesManager>(assembly);
+    TavrinXPCActivity::registerActivity(
+        assembly, kActivity, criteria(),
+        [weak = manager->weak_from_this()](const std::shared_ptr<platform::Activity>& activity) {
+            if (auto self = weak.lock()) self->_runActivity(activity);
+        });
+    log().log("started flush to wire in the background {} with interval {:f} seconds", kActivity,
+              static_cast<double>(kInterval.count()));
+    return manager;
+}
+
+BackgroundActivitiesManager::BackgroundActivitiesManager(Assembly& assembly)
+    : _assembly(assembly),
+      _queueFlusher(assembly.device.serialQueue("com.quorvane.tavrind.backgrondActivitiesManagerQueue")),
+      _feedbackFlusher(TavrinFeedbackFlusher::make(assembly, 1))
+{}
+
+BackgroundActivitiesManager::~BackgroundActivitiesManager()
+{
+    TavrinXPCActivity::unregister(_assembly, kActivity);
+}
+
+void BackgroundActivitiesManager::_runActivity(const std::shared_ptr<platform::Activity>& activity)
+{
+    if (activity->state() != ActivityState::Run) return; // it checks in with the criteria that it was registered with
+    if (_stopFlushing) {
+        log().log("flushing has been stopped, will start again with dump command");
+        TavrinXPCActivity::setState(ActivityState::Done, *activity);
+        return;
+    }
+    log().log("scheduled flush feedbacks to wire {}", kActivity);
+    TavrinXPCActivity::setState(ActivityState::Continue, *activity);
+    auto transaction = _assembly.device.transactions.begin(kActivity);
+    _queueFlusher->async([self = shared_from_this(), activity, transaction = std::move(transaction)] {
+        self->_flusherActivity();
+        TavrinXPCActivity::setState(ActivityState::Done, *activity);
+    });
+}
+
+void BackgroundActivitiesManager::insertFlushActivity(std::move_only_function<void()> callback)
+{
+    _queueFlusher->async([self = shared_from_this(), callback = std::move(callback)]() mutable {
+        self->_flusherActivity();
+        if (callback) callback();
+    });
+}
+
+void BackgroundActivitiesManager::_flusherActivity()
+{
+    _queueFlusher->assertOnQueue();
+    for (const auto& container : _assembly.persistentStorage->getAvailableSessionHandles()) {
+        const auto session = container->read();
+        _assembly.persistentStorage->deleteSessionWithFileContainer(container);
+        if (!session) continue;
+        // In memory again, until it is in an upload.
+        _assembly.feedbackBooks.move(FeedbackFate::Closed, FeedbackFate::Open, session->recordedEvents());
+        _feedbackFlusher->flushSyncFromArray({session});
+        _flushToWire(*_feedbackFlusher);
+    }
+    _flushToWire(*_assembly.crowdsourcingFeedbackFlusher);
+    _assembly.feedbackBooks.save();
+}
+
+void BackgroundActivitiesManager::_flushToWire(TavrinFeedbackFlusher& flusher)
+{
+    for (const platform::Bytes& body : flusher.flushToWireSync())
+        if (_assembly.flusherXPCListener) _assembly.flusherXPCListener->sendDataToSendingStreamListener(body);
+}
+
+void BackgroundActivitiesManager::findUploads()
+{
+    _assembly.uploadURLSession->getTasks(
+        [weak = weak_from_this()](const std::vector<std::shared_ptr<platform::BackgroundTask>>& tasks) {
+            const auto self = weak.lock();
+            if (!self) return;
+            for (const auto& task : tasks) self->_findUpload(*task);
+        });
+}
+
+void BackgroundActivitiesManager::_findUpload(const platform::BackgroundTask& task)
+{
+    const UploadNote note = UploadNote::from(task.note());
+    if (note.process == _assembly.feedbackBooks.process()) return;
+    const std::lock_guard lock(_foundMutex);
+    if (_found.insert(task.identifier()).second) _assembly.feedbackBooks.find(FeedbackFate::Uploading, note.events);
+}
+
+void BackgroundActivitiesManager::taskDidSendBodyData(const std::shared_ptr<platform::BackgroundTask>&,
+                                                      std::uint64_t sent, std::uint64_t expected)
+{
+    const float percent = expected == 0 ? 100.0F : 100.0F * static_cast<float>(sent) / static_cast<float>(expected);
+    log().debug("data transfer {:f} of {:f}", percent, static_cast<float>(expected));
+}
+
+void BackgroundActivitiesManager::taskDidComplete(const std::shared_ptr<platform::BackgroundTask>& task,
+                                                  const std::optional<platform::UrlResponse>& response,
+                                                  const std::optional<platform::Error>& error)
+{
+    log().log("URLSession:task:didCompleteWithError: id={}, error={}", task->identifier(),
+              error ? error->description() : "none");
+    if (error && error->domain == platform::kUrlErrorDomain && error->code == platform::kUrlTimedOut)
+        _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.fbrequesttimedout");
+
+    _findUpload(*task);
+    const std::int64_t count = _feedbackFlusher->getFeedbackCountForTask(*task);
+    _feedbackFlusher->removeFeedbacksForTask(*task);
+    _assembly.crowdsourcingFeedbackFlusher->removeFeedbacksForTask(*task);
+    const bool sent = response && response->statusCode == 200;
+    if (sent) {
+        _assembly.diagnosticData.addValue(count, "com.quorvane.tavrind.feedbacksent");
+    } else {
+        log().fault("response error {}", response ? std::to_string(response->statusCode) : "none");
+        _assembly.diagnosticData.addValue(count, "com.quorvane.tavrind.feedbacknotsent");
+    }
+    _assembly.feedbackBooks.move(FeedbackFate::Uploading, sent ? FeedbackFate::Sent : FeedbackFate::NotSent,
+                                 UploadNote::from(task->note()).events);
+    _assembly.feedbackBooks.save();
+}
+
+void BackgroundActivitiesManager::sessionDidFinishEvents()
+{
+    log().log("URLSessionDidFinishEventsForBackgroundURLSession called");
+}
+
+void BackgroundActivitiesManager::sessionDidBecomeInvalid(const platform::Error& error)
+{
+    log().error("Session became invalid with error {}", error.description());
+}
+
+} // namespace tavrin

@@ -1,0 +1,35 @@
+#pragma once
+
+#include <optional>
+#include <string>
+
+#include "platform/Record.h"
+
+namespace tavrin {
+
+/// What a session file says about its session: what the upload needs beside the events.
+struct ClientSessionHeader : platform::RecordOf<ClientSessionHeader> {
+    static constexpr std::string_view kClass = "ClientSession";
+
+    std::string agent; ///< the client's user agent
+    platform::Uuid userGuid;
+    platform::Value resourceVersions;       ///< dictionary: resource identifier to version; null for none
+    std::optional<platform::Date> baseTime; ///< when the session began
+    std::int64_t previousSessionEndReason = 0;
+    bool firstUse = false;         ///< the client's first session of the day
+    bool removeTimestamps = false; ///< nobody shall learn when the session began
+
+    static constexpr auto fields()
+    {
+        using Self = ClientSessionHeader;
+        return std::tuple{platform::field("agent", &Self::agent),
+                          platform::field("user_guid", &Self::userGuid),
+                          platform::field("resource_versions", &Self::resourceVersions),
+                          platform::field("base_time", &Self::baseTime),
+                          platform::field("previous_session_end_reason", &Self::previousSessionEndReason),
+                          platform::field("first_use", &Self::firstUse),
+                          platform::field("remove_timestamps", &Self::removeTimestamps)};
+    }
+};
+
+} // namespace tavrin

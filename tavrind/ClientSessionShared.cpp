@@ -1,0 +1,70 @@
+#include "tavrind/ClientSessionShared.h"
+
+#include <iterator>
+
+#include "platform/Device.h"
+#include "tavrind/Assembly.h"
+#include "tavrind/TavrinFeedback.h"
+
+namespace tavrin {
+
+ClientSessionShared::ClientSessionShared(Assembly& assembly, std::shared_ptr<TavrinFeedback> feedback,
+                                         std::int64_t previousSessionEndReason)
+    : _assembly(assembly), _userGuid(platform::Uuid::parse(feedback->userGuid).value_or(platform::Uuid())),
+      _previousSessionEndReason(previousSessionEndReason),
+      _sessionQueue(assembly.device.serialQueue("com.quorvane.tavrind.clientSessionSharedQueue"))
+{
+    _begin(std::move(feedback));
+}
+
+void ClientSessionShared::_begin(std::shared_ptr<TavrinFeedback> feedback)
+{
+    const std::string agent = feedback->userAgent;
+    _sessionMap[agent] = std::make_shared<ClientSession>(_assembly, std::move(feedback), _previousSessionEndReason);
+}
+
+void ClientSessionShared::addFeedback(std::shared_ptr<TavrinFeedback> feedback)
+{
+    _sessionQueue->async([self = shared_from_this(), feedback = std::move(feedback)]() mutable {
+        const auto found = self->_sessionMap.find(feedback->userAgent);
+        if (found == self->_sessionMap.end()) return self->_begin(std::move(feedback));
+        found->second->addFeedback(std::move(feedback));
+    });
+}
+
+template <class List> List ClientSessionShared::_joined(List (ClientSession::*collect)())
+{
+    return _sessionQueue->sync([&] {
+        List all;
+        for (const auto& [agent, session] : _sessionMap) {
+            List some = ((*session).*collect)();
+            std::ranges::move(some, std::back_inserter(all));
+        }
+        return all;
+    });
+}
+
+std::vector<std::shared_ptr<TavrinFeedback>> ClientSessionShared::getSessionFeedbacks()
+{
+    return _joined(&ClientSession::getSessionFeedbacks);
+}
+
+platform::Value::Array ClientSessionShared::feedbacksWithRelativeTimestamp()
+{
+    return _joined(&ClientSession::feedbacksWithRelativeTimestamp);
+}
+
+platform::Value::Array ClientSessionShared::privacyFilteredFeedbacksWithRelativeTimestamp()
+{
+    return _joined(&ClientSession::privacyFilteredFeedbacksWithRelativeTimestamp);
+}
+
+void ClientSessionShared::enumerateSessions(const std::function<void(ClientSession& session, bool last)>& callback)
+{
+    _sessionQueue->sync([&] {
+        for (auto each = _sessionMap.begin(); each != _sessionMap.end(); ++each)
+            callback(*each->second, std::next(each) == _sessionMap.end());
+    });
+}
+
+} // namespace tavrin

@@ -1,0 +1,123 @@
+#include "tavrind/FeedbackBooks.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <string_view>
+#include <utility>
+
+#include "platform/Error.h"
+#include "platform/Files.h"
+#include "platform/Uuid.h"
+#include "tavrind/TavrinLogging.h"
+
+namespace tavrin {
+
+using platform::Dictionary;
+using platform::Value;
+
+namespace {
+
+constexpr std::size_t kMaximumFileSize = 64 * 1024;
+
+/// By fate. From kFirstDropped on they are reasons of a drop.
+constexpr std::array<std::string_view, kFeedbackFates> kNames{
+    "open",           "closed",        "uploading",    "sent",         "notSent",   "unknown",
+    "feedbackOff",    "noContainer",   "refusedAppend", "fileTooBig",  "tooOld",    "unreadable",
+    "otherVersion",   "damagedTail",   "notJson",      "noBody",       "noTask",    "endpointUnset",
+};
+constexpr auto kFirstDropped = static_cast<std::size_t>(FeedbackFate::FeedbackOff);
+
+constexpr std::size_t at(FeedbackFate fate)
+{
+    return static_cast<std::size_t>(fate);
+}
+
+} // namespace
+
+FeedbackBooks::FeedbackBooks(platform::FileSystem& files, std::filesystem::path path)
+    : _files(files), _path(std::move(path)), _process(platform::Uuid::random().string())
+{
+    _load();
+}
+
+void FeedbackBooks::_load()
+{
+    const auto contents = _files.read(_path, kMaximumFileSize);
+    if (!contents) {
+        if (contents.error().code != ENOENT)
+            TavrinLogForCategory(kLogFeedback).error("feedback books not read: {}", contents.error().reason());
+        return;
+    }
+    const auto books = platform::parseJson(contents->view(), kMaximumFileSize);
+    if (!books || !books->asDictionary())
+        return TavrinLogForCategory(kLogFeedback).error("feedback books are damaged, beginning new ones");
+
+    for (std::size_t fate = 0; fate < kFeedbackFates; ++fate) {
+        const Value& group = fate < kFirstDropped ? *books : (*books)["dropped"];
+        const std::int64_t events = std::clamp<std::int64_t>(group[kNames[fate]].asInt().value_or(0), 0, INT64_MAX / 64);
+        _recorded += events;
+        _counts[fate] = events;
+    }
+    for (const FeedbackFate underWay : {FeedbackFate::Open, FeedbackFate::Closed, FeedbackFate::Uploading})
+        _unresolved += std::exchange(_counts[at(underWay)], 0);
+    _counts[at(FeedbackFate::Unknown)] += _unresolved;
+}
+
+void FeedbackBooks::record(FeedbackFate fate, std::uint64_t events)
+{
+    const std::lock_guard lock(_mutex);
+    _recorded += static_cast<std::int64_t>(events);
+    _counts[at(fate)] += static_cast<std::int64_t>(events);
+}
+
+void FeedbackBooks::move(FeedbackFate from, FeedbackFate to, std::uint64_t events)
+{
+    const std::lock_guard lock(_mutex);
+    _counts[at(from)] -= static_cast<std::int64_t>(events);
+    _counts[at(to)] += static_cast<std::int64_t>(events);
+}
+
+void FeedbackBooks::find(FeedbackFate fate, std::uint64_t events)
+{
+    const std::lock_guard lock(_mutex);
+    const auto found = static_cast<std::int64_t>(events);
+    const std::int64_t known = std::min(found, _unresolved);
+    _unresolved -= known;
+    _counts[at(FeedbackFate::Unknown)] -= known;
+    _recorded += found - known;
+    _counts[at(fate)] += found;
+}
+
+void FeedbackBooks::save()
+{
+    const std::lock_guard saving(_saving);
+    const std::string text = platform::toJson(description());
+    auto written = _files.createDirectories(_path.parent_path());
+    if (written) written = _files.writeAtomically(_path, text);
+    if (!written) TavrinLogForCategory(kLogFeedback).error("feedback books not saved: {}", written.error().reason());
+}
+
+std::int64_t FeedbackBooks::recorded() const
+{
+    const std::lock_guard lock(_mutex);
+    return _recorded;
+}
+
+std::int64_t FeedbackBooks::count(FeedbackFate fate) const
+{
+    const std::lock_guard lock(_mutex);
+    return _counts[at(fate)];
+}
+
+Value FeedbackBooks::description() const
+{
+    const std::lock_guard lock(_mutex);
+    Dictionary books{{"recorded", _recorded}};
+    Dictionary dropped;
+    for (std::size_t fate = 0; fate < kFeedbackFates; ++fate)
+        (fate < kFirstDropped ? books : dropped).set(std::string(kNames[fate]), _counts[fate]);
+    books.set("dropped", std::move(dropped));
+    return books;
+}
+
+} // namespace tavrin

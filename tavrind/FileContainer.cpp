@@ -1,0 +1,207 @@
+#include "tavrind/FileContainer.h"
+
+#include <array>
+#include <bit>
+#include <exception>
+
+#include "platform/Files.h"
+#include "platform/Queue.h"
+#include "platform/Transactions.h"
+#include "tavrind/ArchivedDataIterator.h"
+#include "tavrind/ClientSession.h"
+#include "tavrind/ClientSessionHeader.h"
+#include "tavrind/FeedbackBooks.h"
+#include "tavrind/mmap_file.h"
+#include "tavrind/TavrinDiagnosticDataReporter.h"
+#include "tavrind/TavrinFeedback.h"
+#include "tavrind/TavrinLogging.h"
+
+namespace tavrin {
+
+using platform::Bytes;
+
+namespace {
+
+const platform::Log& log()
+{
+    return TavrinLogForCategory(kLogFeedbackStorage);
+}
+
+/// Records that a session file may hold.
+const platform::RecordClasses& fileRecordClasses()
+{
+    static const auto classes = [] {
+        platform::RecordClasses all = tavrindRecordClasses();
+        all.add<ClientSessionHeader>();
+        return all;
+    }();
+    return classes;
+}
+
+/// The next record as a `T`; null if it is none, or broken.
+template <class T> std::shared_ptr<T> readNext(ArchivedDataIterator& records)
+{
+    const auto archive = records.readNextObject();
+    if (!archive) return nullptr;
+    auto record = platform::castRecord<T>(platform::unarchive(*archive, fileRecordClasses()));
+    if (!record) log().error("{}", record.error().reason());
+    return record.value_or(nullptr);
+}
+
+} // namespace
+
+FileContainer::FileContainer(std::shared_ptr<const FileContainerStore> store, std::filesystem::path fileUrl,
+                             std::uint64_t feedbackCount)
+    : _store(std::move(store)), _fileUrl(std::move(fileUrl)), _feedbackCount(feedbackCount)
+{}
+
+FileContainer::FileContainer(std::shared_ptr<const FileContainerStore> store, std::filesystem::path fileUrl,
+                             std::unique_ptr<platform::AppendFile> fileHandle)
+    : _store(std::move(store)), _fileUrl(std::move(fileUrl)), _fileHandle(std::move(fileHandle))
+{}
+
+FileContainer::~FileContainer() = default;
+
+void FileContainer::writeSessionHeader(ClientSessionHeader header)
+{
+    _store->queue->async([self = shared_from_this(), header = std::move(header)] {
+        if (!self->_archiveObject(platform::archiveValue(self->_store->version))) {
+            log().error("Could not write version string");
+            self->_closeFile();
+        }
+        if (!self->_archiveObject(platform::archive(header))) {
+            log().error("Could not write root object");
+            self->_closeFile();
+        }
+    });
+}
+
+void FileContainer::writeFeedback(std::shared_ptr<const TavrinFeedback> feedback, std::move_only_function<void()> done)
+{
+    _store->queue->async([self = shared_from_this(), feedback = std::move(feedback), done = std::move(done)]() mutable {
+        FeedbackBooks& books = self->_store->books;
+        if (!self->_fileHandle) return books.move(FeedbackFate::Open, FeedbackFate::NoContainer, 1);
+        if (self->_archiveObject(platform::archive(*feedback)))
+            ++self->_feedbackCount;
+        else
+            books.move(FeedbackFate::Open, FeedbackFate::RefusedAppend, 1);
+        if (done) done();
+    });
+}
+
+bool FileContainer::_archiveObject(const std::string& archive)
+{
+    _store->queue->assertOnQueue();
+    if (!_fileHandle) return false;
+    const auto transaction = _store->transactions.begin("archiveObject");
+    const std::uint64_t end = _fileHandle->size();
+    const std::uint64_t length = archive.size();
+    if (end + sizeof(length) + length >= _store->maxFileSize) {
+        _store->diagnosticData.addValue(1, "com.quorvane.tavrind.filesizeexceeded");
+        log().error("bytes written ({}) + feedback ({}) exceeds max session size ({})", end, length,
+                    _store->maxFileSize);
+        return false;
+    }
+    const auto frame = std::bit_cast<std::array<char, sizeof(length)>>(length);
+    const auto written = _fileHandle->append({{frame.data(), frame.size()}, archive});
+    if (!written) log().error("record not written to {}: {}", _fileUrl.string(), written.error().reason());
+    return written.has_value();
+}
+
+void FileContainer::close()
+{
+    _store->queue->async([self = shared_from_this()] {
+        if (self->_fileHandle) self->_closeFile();
+        self->_store->books.move(FeedbackFate::Open, FeedbackFate::Closed, self->_feedbackCount);
+    });
+}
+
+void FileContainer::_closeFile()
+{
+    _store->queue->assertOnQueue();
+    log().debug("close file url {}", _fileUrl.string());
+    _fileHandle.reset();
+}
+
+std::shared_ptr<ClientSession> FileContainer::read()
+{
+    return _store->queue->sync([this] { return _read(); });
+}
+
+std::shared_ptr<ClientSession> FileContainer::_notRead(FeedbackFate fate, const std::string& text)
+{
+    log().error("{}", text);
+    _store->books.move(FeedbackFate::Closed, fate, std::exchange(_feedbackCount, 0));
+    return nullptr;
+}
+
+std::shared_ptr<ClientSession> FileContainer::_read()
+{
+    log().debug("reading file url {}", _fileUrl.string());
+    if (_fileHandle) {
+        log().error("file is already open closing it {}", _fileUrl.string());
+        _closeFile();
+    }
+    if (_fileUrl.empty()) return _notRead(FeedbackFate::Unreadable, "No file url available");
+    const auto attributes = _store->files.info(_fileUrl);
+    if (!attributes)
+        return _notRead(FeedbackFate::Unreadable, "Attribute fetch error " + attributes.error().description());
+    if (attributes->size > _store->maxFileSize) {
+        _store->diagnosticData.addValue(1, "com.quorvane.tavrind.filetoolarge");
+        return _notRead(FeedbackFate::FileTooBig, "Session too big to process");
+    }
+    if (attributes->size == 0) return _notRead(FeedbackFate::Unreadable, "empty file");
+    const auto file = _store->files.openForReading(_fileUrl);
+    if (!file)
+        return _notRead(FeedbackFate::Unreadable, "Could not open file for reading " + file.error().description());
+    const auto data = mmapFileHandle(*file);
+    if (!data) return _notRead(FeedbackFate::Unreadable, "mmap: " + data.error().description());
+    try {
+        return _unarchiveObject(*data);
+    } catch (const std::exception& exception) { // out of memory, or a fault of a library
+        return _notRead(FeedbackFate::Unreadable, std::string("exception reading session archive ") + exception.what());
+    }
+}
+
+std::shared_ptr<ClientSession> FileContainer::_unarchiveObject(const Bytes& data)
+{
+    _store->queue->assertOnQueue();
+    if (data.size() > UINT32_MAX) return _notRead(FeedbackFate::Unreadable, "erroneous file data length");
+
+    ArchivedDataIterator records(data);
+    const auto versionArchive = records.readNextObject();
+    const auto version = versionArchive ? platform::valueFromArchive(*versionArchive) : platform::Value();
+    if (!version || !version->asString()) return _notRead(FeedbackFate::Unreadable, "version string not stored");
+    if (*version->asString() != _store->version)
+        return _notRead(FeedbackFate::OtherVersion, "version not supported: " + *version->asString());
+    const auto header = readNext<ClientSessionHeader>(records);
+    if (!header) return _notRead(FeedbackFate::Unreadable, "client session not stored");
+
+    std::vector<std::shared_ptr<TavrinFeedback>> feedbacks;
+    while (records.hasMore()) {
+        const std::uint64_t position = records.position();
+        auto feedback = readNext<TavrinFeedback>(records);
+        if (!feedback) {
+            log().error("could not unarchive feedback range {} size {}", position, records.size());
+            log().error("tavrin feedback expected");
+            break;
+        }
+        feedbacks.push_back(std::move(feedback));
+    }
+    if (feedbacks.size() < _feedbackCount)
+        _store->books.move(FeedbackFate::Closed, FeedbackFate::DamagedTail, _feedbackCount - feedbacks.size());
+    return std::make_shared<ClientSession>(*header, std::move(feedbacks));
+}
+
+std::uint64_t FileContainer::countFeedback(platform::FileSystem& files, const std::filesystem::path& fileUrl)
+{
+    const auto file = files.openForReading(fileUrl);
+    const auto data = file ? mmapFileHandle(*file) : std::unexpected(file.error());
+    if (!data) return 0;
+    ArchivedDataIterator records(*data);
+    std::uint64_t count = 0;
+    while (records.skipObject()) ++count;
+    return count > 2 ? count - 2 : 0; // the version and the header
+}
+
+} // namespace tavrin

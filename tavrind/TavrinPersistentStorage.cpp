@@ -1,0 +1,162 @@
+#include "tavrind/TavrinPersistentStorage.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <charconv>
+
+#include "platform/Clock.h"
+#include "platform/Device.h"
+#include "platform/UserDefaults.h"
+#include "tavrind/Assembly.h"
+#include "tavrind/ClientSessionManager.h"
+#include "tavrind/FeedbackBooks.h"
+#include "tavrind/FileContainer.h"
+#include "tavrind/TavrinLogging.h"
+
+namespace tavrin {
+
+namespace fs = std::filesystem;
+
+namespace {
+
+constexpr std::string_view kPrefix = "session.";
+constexpr std::int64_t kDefaultMaxFileSize = 4u << 20;   // bytes
+constexpr std::int64_t kDefaultMaxFileAge = 48 * 60 * 60; // seconds
+constexpr int kMaximumNameAttempts = 16;
+
+const platform::Log& log()
+{
+    return TavrinLogForCategory(kLogFeedbackStorage);
+}
+
+std::int64_t limit(const platform::UserDefaults& userDefaults, std::string_view key, std::int64_t fallback)
+{
+    const std::int64_t value = userDefaults.integer(key).value_or(0);
+    return value < 1 ? fallback : value;
+}
+
+} // namespace
+
+std::optional<std::int32_t> sessionNumber(std::string_view fileName)
+{
+    if (!fileName.starts_with(kPrefix)) return std::nullopt;
+    const std::string_view digits = fileName.substr(kPrefix.size());
+    if (digits.empty() || !std::ranges::all_of(digits, [](char c) { return c >= '0' && c <= '9'; })) return std::nullopt;
+    std::int32_t number = 0;
+    const auto [end, error] = std::from_chars(digits.data(), digits.data() + digits.size(), number);
+    if (error != std::errc() || number > INT32_MAX / 2) return std::nullopt;
+    return number;
+}
+
+TavrinPersistentStorage::TavrinPersistentStorage(Assembly& assembly)
+    : _assembly(assembly), _queue(assembly.device.serialQueue("com.quorvane.tavrind.persistentStorageQueue",
+                                                              platform::Priority::Background)),
+      _cachesUrl(assembly.device.directories.caches / "com.quorvane.tavrind"),
+      _store(std::make_shared<FileContainerStore>(
+          assembly.fileManager, assembly.device.transactions, assembly.diagnosticData, assembly.feedbackBooks, _queue,
+          ClientSessionManager::tavrindUserAgent(),
+          static_cast<std::uint64_t>(limit(assembly.userDefaults, "TAVSessionSizeLimit", kDefaultMaxFileSize)))),
+      _maxFileAge(static_cast<double>(limit(assembly.userDefaults, "TAVSessionMaxAge", kDefaultMaxFileAge)))
+{
+    _scanCacheDirectory();
+}
+
+TavrinPersistentStorage::~TavrinPersistentStorage() = default;
+
+void TavrinPersistentStorage::_scanCacheDirectory()
+{
+    if (_cachesUrl.empty()) return log().error("error scanning cache directory, could not get path");
+    auto names = _assembly.fileManager.list(_cachesUrl);
+    if (!names && names.error().code == ENOENT) names.emplace(); // nothing was ever kept
+    if (!names) return log().error("error scanning cache directory {}", names.error().description());
+    std::ranges::sort(*names, {}, [](const std::string& name) { return std::pair(sessionNumber(name), name); });
+    std::int32_t largest = 0;
+    for (const std::string& name : *names)
+        if (name.starts_with(kPrefix)) largest = std::max(largest, _adopt(name).value_or(0));
+    _handleId = largest + 1;
+}
+
+/// Lists a file of an earlier process, or deletes it. Its number, unless the file is gone.
+std::optional<std::int32_t> TavrinPersistentStorage::_adopt(const std::string& name)
+{
+    const fs::path fileUrl = _cachesUrl / name;
+    const auto attributes = _assembly.fileManager.info(fileUrl);
+    if (!attributes) {
+        log().error("Attribute fetch error {}", attributes.error().description());
+        return std::nullopt;
+    }
+    if (attributes->kind != platform::FileInfo::Kind::File) {
+        log().error("{} is no file, and is left alone", fileUrl.string());
+        return sessionNumber(name); // the name is taken all the same
+    }
+    const std::uint64_t feedbackCount = FileContainer::countFeedback(_assembly.fileManager, fileUrl);
+    if (platform::toSeconds(_assembly.device.clock.wallNow() - attributes->created) > _maxFileAge) {
+        _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.filetooold");
+        _assembly.feedbackBooks.find(FeedbackFate::TooOld, feedbackCount);
+        if (const auto removed = _assembly.fileManager.remove(fileUrl); !removed)
+            log().error("file removing error {}", removed.error().description());
+        return std::nullopt;
+    }
+    _assembly.feedbackBooks.find(FeedbackFate::Closed, feedbackCount);
+    _fileContainers.push_back(std::make_shared<FileContainer>(_store, fileUrl, feedbackCount));
+    return sessionNumber(name);
+}
+
+std::optional<fs::path> TavrinPersistentStorage::_newFileUrl()
+{
+    if (_cachesUrl.empty()) return std::nullopt;
+    if (const auto made = _assembly.fileManager.createDirectories(_cachesUrl); !made) {
+        log().error("{}", made.error().description());
+        return std::nullopt;
+    }
+    return _cachesUrl / (std::string(kPrefix) + std::to_string(_handleId++));
+}
+
+std::shared_ptr<FileContainer> TavrinPersistentStorage::createFileContainerForWriting()
+{
+    // Names that something else has taken since the scan are passed over.
+    for (int attempt = 0; attempt < kMaximumNameAttempts; ++attempt) {
+        const auto fileUrl = _newFileUrl();
+        if (!fileUrl) {
+            log().error("Could not get a file url");
+            return nullptr;
+        }
+        log().debug("new file url {}", fileUrl->string());
+        auto file = _assembly.fileManager.createForAppending(*fileUrl);
+        if (file) return std::make_shared<FileContainer>(_store, *fileUrl, std::move(*file));
+        log().error("Could not open file for writing {}", file.error().description());
+        if (file.error().code != EEXIST) return nullptr;
+    }
+    return nullptr;
+}
+
+std::vector<std::shared_ptr<FileContainer>> TavrinPersistentStorage::getAvailableSessionHandles()
+{
+    return _queue->sync([this] {
+        for (const auto& container : _fileContainers) log().debug("available file url {}", container->fileUrl().string());
+        return _fileContainers;
+    });
+}
+
+void TavrinPersistentStorage::closeSessionWithFileContainer(std::shared_ptr<FileContainer> container)
+{
+    container->close();
+    _queue->async([self = shared_from_this(), container = std::move(container)]() mutable {
+        self->_fileContainers.push_back(std::move(container));
+        self->_assembly.feedbackBooks.save();
+    });
+}
+
+void TavrinPersistentStorage::deleteSessionWithFileContainer(std::shared_ptr<FileContainer> container)
+{
+    _queue->async([self = shared_from_this(), container = std::move(container)] {
+        std::erase(self->_fileContainers, container);
+        const fs::path& fileUrl = container->fileUrl();
+        if (fileUrl.empty()) return log().error("Handle {} does not have a File URL", static_cast<const void*>(container.get()));
+        log().debug("delete file url {}", fileUrl.string());
+        if (const auto removed = self->_assembly.fileManager.remove(fileUrl); !removed)
+            log().error("File {} delete failed", fileUrl.string());
+    });
+}
+
+} // namespace tavrin

@@ -1,0 +1,39 @@
+#pragma once
+
+#include <functional>
+#include <memory>
+#include <string>
+
+#include "platform/ActivityScheduler.h"
+
+namespace tavrin {
+
+struct Assembly;
+
+/// When a background activity may run, put together entry by entry.
+struct TavrinXPCCriteria {
+    [[nodiscard]] static platform::ActivityCriteria createCriteria() { return {}; }
+    static void setRepeating(bool repeating, platform::ActivityCriteria& criteria) { criteria.repeating = repeating; }
+    static void setDelay(std::chrono::seconds delay, platform::ActivityCriteria& criteria) { criteria.delay = delay; }
+    static void setGracePeriod(std::chrono::seconds period, platform::ActivityCriteria& criteria)
+    {
+        criteria.gracePeriod = period;
+    }
+    static void setAllowBatteryUsage(bool allow, platform::ActivityCriteria& criteria) { criteria.allowBattery = allow; }
+    static void setInterval(std::chrono::seconds interval, platform::ActivityCriteria& criteria)
+    {
+        criteria.interval = interval;
+    }
+};
+
+/// The device's background activities, as this daemon uses them. Any thread.
+struct TavrinXPCActivity {
+    using Handler = platform::ActivityScheduler::Handler;
+    static void registerActivity(Assembly& assembly, const std::string& identifier,
+                                 platform::ActivityCriteria criteria, Handler handler);
+    static void unregister(Assembly& assembly, const std::string& identifier);
+    /// Whether the activity moved on; a refusal is logged as a fault.
+    static bool setState(platform::ActivityState state, platform::Activity& activity);
+};
+
+} // namespace tavrin

@@ -1,0 +1,325 @@
+#include <algorithm>
+
+#include "tavrind/ClientSession.h"
+#include "tavrind/TavrinUserGUIDController.h"
+#include "tests/support/FeedbackFixture.h"
+
+namespace tavrin::test {
+namespace {
+
+using namespace std::chrono_literals;
+using Types = std::vector<std::string>;
+
+struct SessionTest : FeedbackTest {
+    SessionState state() { return manager()->currentState(); }
+    /// Ends what is open, uploads everything, and answers the sessions, first to last.
+    std::vector<Value> sessions()
+    {
+        flushSession();
+        upload();
+        std::vector<Value> all;
+        for (const auto& task : uploads()) all.push_back(decoded(*task));
+        return all;
+    }
+    static std::string reason(const Value& session)
+    {
+        const Value last = session["fb"][session["fb"].count() - 1];
+        return last["reason"].asString() ? *last["reason"].asString() : "";
+    }
+};
+
+TEST_F(SessionTest, SessionsEndAtTheirLimits)
+{
+    begin();
+    struct Case {
+        const char* what;
+        std::function<void()> happens; ///< after one event
+        const char* endReason;
+        Types events;
+    };
+    const Types appears{"search_view_appear"};
+    const auto events = [](Types types) {
+        types.insert(types.begin(), "search_view_appear");
+        types.emplace_back("session_end");
+        return types;
+    };
+    const Case cases[] = {
+        {"asked to end", [this] { flushSession(); }, "external request", events({})},
+        {"15 minutes", [this] { device.advance(900s); }, "max session time passed", events({})},
+        {"events keep it busy beyond 10 minutes, not beyond 15",
+         [this] {
+             for (int i = 0; i < 8; ++i) {
+                 device.advance(119s);
+                 report("ZRClearInputFeedback");
+             }
+         },
+         "max session time passed", events(Types(7, "clear_input"))},
+        {"an engagement behind 10 minutes",
+         [this] {
+             device.advance(601s);
+             report("ZRResultEngagementFeedback");
+             EXPECT_EQ(state(), SessionState::None);
+         },
+         "engagement received", events({"result_engagement"})},
+        {"a card's engagement, too",
+         [this] {
+             device.advance(601s);
+             report("ZRCardSectionEngagementFeedback");
+         },
+         "engagement received", events({"card_engagement"})},
+        {"3 idle minutes behind 10",
+         [this] {
+             device.advance(599s);
+             report("ZRClearInputFeedback");
+             device.advance(180s);
+             report("ZRDidGoToSiteFeedback");
+             EXPECT_EQ(state(), SessionState::Open) << "the event at hand begins the next";
+         },
+         "session idle", events({"clear_input"})},
+        {"3 idle minutes alone don't end it",
+         [this] {
+             device.advance(300s);
+             report("ZRClearInputFeedback");
+             flushSession();
+         },
+         "external request", events({"clear_input"})},
+        {"an engagement alone doesn't either",
+         [this] {
+             report("ZRResultEngagementFeedback");
+             flushSession();
+         },
+         "external request", events({"result_engagement"})},
+        {"critical memory is not listened to, another GUID is",
+         [this] {
+             assembly().guidController->reset();
+             device.drain();
+             report("ZRClearInputFeedback");
+         },
+         "guid changed", events({})},
+    };
+    std::string previous = "no previous session";
+    for (const Case& each : cases) {
+        const std::size_t before = uploads().size();
+        appear();
+        EXPECT_EQ(state(), SessionState::Open) << each.what;
+        each.happens();
+        const Value session = sessions().at(before);
+        EXPECT_EQ(typesIn(session), each.events) << each.what;
+        EXPECT_EQ(reason(session), each.endReason) << each.what;
+        EXPECT_EQ(session["previous_session_end_reason"], Value(previous)) << each.what;
+        previous = sessions().size() == before + 1 ? each.endReason : "external request";
+        device.advance(1h);
+    }
+    expectBooksClose();
+}
+
+TEST_F(SessionTest, TimersOfAnEarlierSessionDoNothing)
+{
+    begin();
+    appear();
+    device.advance(500s);
+    flushSession();
+    appear();
+    device.advance(120s); // the first one's ten minutes are over
+    EXPECT_EQ(state(), SessionState::Open);
+    device.advance(481s);
+    EXPECT_EQ(state(), SessionState::SoftLimit);
+}
+
+TEST_F(SessionTest, SystemClockSetBackDoesNotKeepASessionAlive)
+{
+    begin();
+    appear();
+    device.clock.setWall(device.clock.wallNow() - 24h * 365 * 20);
+    report("ZRClearInputFeedback");
+    device.advance(901s);
+    EXPECT_EQ(state(), SessionState::None);
+    flushSession();
+    upload();
+    EXPECT_EQ(uploads().size(), 1u);
+}
+
+TEST_F(SessionTest, NewGuidBeginsTheNextSession)
+{
+    begin();
+    device.advance(890s);
+    appear();
+    device.advance(9s);
+    report("ZRClearInputFeedback"); // the GUID is 15 minutes old in a second
+    device.advance(1s);
+    report("ZRDidGoToSiteFeedback");
+    const auto all = sessions();
+    ASSERT_EQ(all.size(), 2u);
+    EXPECT_NE(all[0]["user_guid"], all[1]["user_guid"]);
+    EXPECT_EQ(typesIn(all[1]), (Types{"did_go_to_site", "session_end"}));
+}
+
+TEST_F(SessionTest, EngagementAndIdlenessRollTheGuid)
+{
+    begin();
+    for (const auto& [event, wait] : {std::pair("ZRResultEngagementFeedback", 601s), {"ZRClearInputFeedback", 781s}}) {
+        const platform::Uuid before = assembly().guidController->currentUserGUID();
+        appear();
+        device.advance(wait - 1s);
+        report(event);
+        EXPECT_NE(assembly().guidController->currentUserGUID(), before) << event;
+        flushSession();
+        device.advance(1h);
+        assembly().guidController->reset();
+        device.drain();
+    }
+}
+
+TEST_F(SessionTest, OneSessionForEachUserAgentOfASharedOne)
+{
+    begin();
+    appear();
+    auto other = client("com.quorvane.wendral", "Wendral/7", 78);
+    other->call("ReportEvent", {"event", std::int64_t{3}, Dictionary{{"class", "ZRClearInputFeedback"}}});
+    device.drain();
+    const auto all = sessions();
+    ASSERT_EQ(all.size(), 2u);
+    EXPECT_EQ(all[0]["agent"], Value("Vistrel/4"));
+    EXPECT_EQ(all[1]["agent"], Value("Wendral/7"));
+    EXPECT_EQ(all[0]["user_guid"], all[1]["user_guid"]);
+    EXPECT_EQ(typesIn(all[1]), (Types{"clear_input", "session_end"}));
+    EXPECT_EQ(counter("Vistrel/4.sessions"), 1);
+}
+
+TEST_F(SessionTest, EndOfAConnection)
+{
+    platform::test::LogCapture log;
+    begin(true);
+    appear();
+    connection->end();
+    device.drain();
+    EXPECT_EQ(state(), SessionState::Open) << "a shared session goes on";
+    EXPECT_TRUE(log.has(platform::LogLevel::Debug, "Tavrin_Session", "session not flushed on invalidation"));
+    EXPECT_EQ(typesIn(sessions().at(0)), (Types{"search_view_appear", "connection_invalidated", "session_end"}));
+
+    begin(false);
+    appear();
+    EXPECT_EQ(manager()->session(), nullptr) << "the client's own manager has it";
+    connection->end();
+    device.drain();
+    EXPECT_TRUE(log.has(platform::LogLevel::Debug, "Tavrin_Session", "session flushed on invalidation"));
+    upload();
+    EXPECT_EQ(typesIn(decoded(*uploads().at(0))), (Types{"search_view_appear", "session_end"}));
+}
+
+TEST_F(SessionTest, BagSwitchesFeedbackOffByUserAgent)
+{
+    begin();
+    connection = client("com.quorvane.news", "News/1", 79);
+    appear();
+    EXPECT_TRUE(sessionFiles().empty());
+    EXPECT_EQ(booked(FeedbackFate::FeedbackOff), 1);
+    expectBooksClose();
+}
+
+TEST_F(SessionTest, WithoutABagFeedbackIsKept)
+{
+    startWithoutBag();
+    connection = client();
+    device.advance(2s);
+    const std::size_t before = sessionFiles().size();
+    appear();
+    EXPECT_EQ(sessionFiles().size(), before + 1);
+}
+
+TEST_F(SessionTest, FirstUseOfTheDayByTheLocalCalendar)
+{
+    begin(); // 2026-01-01 01:00 in Zurich
+    const auto firstUse = [this] {
+        appear();
+        return sessions().back()["first_use"];
+    };
+    EXPECT_EQ(firstUse(), Value(true));
+    EXPECT_EQ(firstUse(), Value(false));
+    device.advance(22h + 58min);
+    EXPECT_EQ(firstUse(), Value(false)) << "still the first of January there";
+    device.advance(2min);
+    EXPECT_EQ(firstUse(), Value(true)) << "midnight there, 23:00 in UTC";
+    restart();
+    connection = client();
+    EXPECT_EQ(firstUse(), Value(false)) << "remembered";
+    EXPECT_EQ(counter("vistrel.dailyactiveusers"), 2);
+    connection = client("org.example", "Example/1", 80);
+    EXPECT_EQ(firstUse(), Value(false)) << "nobody follows this client";
+}
+
+TEST(FirstUse, ClientsByTheirAgent)
+{
+    EXPECT_EQ(firstUseKey("Vistrel/4 Wendral"), "TavrinFirstUseOfTheDay_wendral") << "the first of the list counts";
+    EXPECT_EQ(firstUseKey("KIVO/1"), "TavrinFirstUseOfTheDay_kivo");
+    EXPECT_EQ(firstUseKey("Lookup in News"), "TavrinFirstUseOfTheDay_lookup");
+    EXPECT_EQ(firstUseKey(""), std::nullopt);
+    EXPECT_EQ(dailyActiveClient("TavrinFirstUseOfTheDay_messages"), "messages");
+    EXPECT_EQ(dailyActiveClient("TavrinFirstUseOfTheDay_"), std::nullopt);
+}
+
+TEST_F(SessionTest, OneOffSessions)
+{
+    begin();
+    const Dictionary json{{"features", Value::Array{1, 2}}};
+    report("ZRCustomFeedback", {{"feedbackType", 3}, {"jsonFeedback", json}});
+    report("ZRCustomFeedback", {{"feedbackType", 1}, {"jsonFeedback", json}});
+    report("ZRCustomFeedback", {{"feedbackType", 9}, {"jsonFeedback", json}}); // dropped
+    upload();
+    ASSERT_EQ(uploads().size(), 2u);
+    const Value features = decoded(*uploads()[0]);
+    EXPECT_EQ(features["fb"][0]["features"], Value(Value::Array{1, 2}));
+    EXPECT_EQ(features["base_time"], Value(0)) << "nobody shall know when these were";
+    EXPECT_EQ(features["fb"][0]["query_id"], Value());
+    EXPECT_EQ(features["user_guid"], Value(""));
+    EXPECT_GT(decoded(*uploads()[1])["base_time"].asInt().value_or(0), 0);
+
+    auto stranger = connect(99); // has not configured
+    stranger->call("ReportEvent", {"event", std::int64_t{1}, Dictionary{{"class", "ZRClearInputFeedback"}}});
+    device.drain();
+    upload();
+    const Value error = decoded(*uploads().at(2));
+    EXPECT_EQ(typesIn(error), Types{"error"});
+    EXPECT_EQ(error["agent"], Value(ClientSessionManager::tavrindUserAgent()));
+    EXPECT_EQ(error["fb"][0]["error"]["reason"], Value("client state nil"));
+    expectBooksClose();
+}
+
+TEST_F(SessionTest, AForeignGuidIsReportedInTheSession)
+{
+    begin();
+    ClientSession session(assembly(), std::make_shared<TavrinFeedback>(std::make_shared<ZRClearInputFeedback>(), 1,
+                                                                       platform::Uuid::random().string(), "A/1"));
+    session.addFeedback(std::make_shared<TavrinFeedback>(std::make_shared<ZRClearInputFeedback>(), 2,
+                                                         platform::Uuid::random().string(), "A/1"));
+    session.addFeedback(nullptr);
+    session.sessionComplete();
+    device.drain();
+    upload();
+    const Value uploaded = decoded(*uploads().at(0));
+    ASSERT_EQ(uploaded["fb"].count(), 3u);
+    const auto isError = [](const Value& event) { return event["type"] == Value("error"); };
+    EXPECT_EQ(std::ranges::count_if(*uploaded["fb"].asArray(), isError), 1);
+    expectBooksClose();
+}
+
+TEST_F(SessionTest, FeedbackInMemoryIsAnsweredWithTimesSinceTheFirst)
+{
+    begin(false);
+    assembly().testFeedbacks = true;
+    report("ZRClearInputFeedback", {{"timestamp", 5'000'000'000}}, 7);
+    report("ZRDidGoToSiteFeedback", {{"timestamp", 5'001'999'999}}, 8);
+    report("ZRSearchViewDisappearFeedback", {{"timestamp", 4'000'000'000}}, 6);
+    const auto call = connection->call("Feedback", {""});
+    device.drain();
+    const Value events = call->argument(0);
+    ASSERT_EQ(events.count(), 3u);
+    EXPECT_EQ(events[0]["type"], Value("search_view_disappear"));
+    EXPECT_EQ(events[0]["timestamp"], Value(0));
+    EXPECT_EQ(events[1]["timestamp"], Value(1000));
+    EXPECT_EQ(events[2]["timestamp"], Value(1001)) << "whole milliseconds, cut";
+    EXPECT_EQ(events[2]["query_id"], Value(8));
+}
+
+} // namespace
+} // namespace tavrin::test

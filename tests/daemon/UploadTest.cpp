@@ -1,0 +1,360 @@
+#include <openssl/evp.h>
+
+#include "platform/Record.h"
+#include "tavrind/ArchivedDataIterator.h"
+#include "tavrind/CompressedOutputStream.h"
+#include "tavrind/TavrinBagController.h"
+#include "tavrind/TavrinFeedbackFlusher.h"
+#include "tests/support/FeedbackFixture.h"
+
+namespace tavrin::test {
+namespace {
+
+using namespace std::chrono_literals;
+using Types = std::vector<std::string>;
+using platform::ActivityState;
+using platform::test::LogCapture;
+
+std::string sha512(std::string_view text)
+{
+    std::array<unsigned char, 64> digest{};
+    EVP_Digest(text.data(), text.size(), digest.data(), nullptr, EVP_sha512(), nullptr);
+    std::string digits;
+    for (const unsigned char byte : digest) {
+        digits += "0123456789abcdef"[byte >> 4];
+        digits += "0123456789abcdef"[byte & 15];
+    }
+    return digits;
+}
+
+struct UploadTest : FeedbackTest {
+    /// A session with one event and its end, uploaded.
+    auto uploadOne()
+    {
+        appear();
+        flushSession();
+        upload();
+        return uploads().back();
+    }
+};
+
+TEST_F(UploadTest, WhatTheServiceGets)
+{
+    begin();
+    const auto task = uploadOne();
+    EXPECT_TRUE(task->resumed);
+    const platform::UrlRequest& request = task->originalRequest();
+    EXPECT_EQ(request.method, "POST");
+    EXPECT_EQ(request.url.string(), "https://f.example/feedback?v=2") << "the bag's own query is replaced";
+    EXPECT_EQ(request.timeout, platform::Duration(300s));
+    const auto text = devserver::inflateRaw(task->body, 1u << 20).value();
+    ASSERT_TRUE(request.headers.find("X-Quorvane-Digest"));
+    EXPECT_EQ(*request.headers.find("X-Quorvane-Digest"), sha512(text));
+
+    const Value session = decoded(*task);
+    std::vector<std::string> keys;
+    for (const auto& [key, value] : *session.asDictionary()) keys.push_back(key);
+    EXPECT_EQ(keys, (Types{"fb", "agent", "user_guid", "resource_versions", "first_use", "base_time",
+                           "previous_session_end_reason"}));
+    EXPECT_EQ(session["base_time"], Value(1767225600));
+    EXPECT_TRUE(sessionFiles().empty());
+    EXPECT_TRUE(device.files.list("/tmp").value_or(std::vector<std::string>()).empty()) << "nothing is left behind";
+}
+
+TEST_F(UploadTest, EndsAreCounted)
+{
+    begin();
+    const auto fail = [](std::int64_t code) {
+        return platform::Error::withReason(std::string(platform::kUrlErrorDomain), code, "no");
+    };
+    uploadOne()->respond(200);
+    device.drain();
+    EXPECT_EQ(counter("feedbacksent"), 7) << "top-level keys are what is counted";
+    uploadOne()->respond(500);
+    uploadOne()->fail(fail(platform::kUrlTimedOut));
+    uploadOne()->fail(fail(platform::kUrlTooLarge));
+    device.drain();
+    EXPECT_EQ(counter("feedbacksent"), 7);
+    EXPECT_EQ(counter("feedbacknotsent"), 21);
+    EXPECT_EQ(counter("fbrequesttimedout"), 1);
+    EXPECT_TRUE(assembly().backgroundFlusher->feedbackFlusher()->feedbacksPerTask().empty());
+    EXPECT_EQ(booked(FeedbackFate::Sent), 2);
+    EXPECT_EQ(booked(FeedbackFate::NotSent), 6);
+    expectBooksClose();
+}
+
+TEST_F(UploadTest, CrowdsourcingRecordsGoOutOnTheirOwn)
+{
+    begin();
+    report("ZRCustomFeedback", {{"feedbackType", 2}, {"jsonFeedback", Dictionary{{"tld", "ch"}}}});
+    report("ZRCustomFeedback", {{"feedbackType", 2}}); // no JSON
+    EXPECT_EQ(counter("dp.submit"), 2);
+    upload();
+    ASSERT_EQ(uploads().size(), 1u);
+    EXPECT_EQ(uploads()[0]->originalRequest().url.string(), "https://f.example/crowd?y=2") << "as the bag has it";
+    EXPECT_EQ(decoded(*uploads()[0]), Value(Dictionary{{"tld", "ch"}}));
+    uploads()[0]->respond(200);
+    device.drain();
+    EXPECT_EQ(counter("feedbacksent"), 0) << "only sessions are counted";
+    EXPECT_EQ(booked(FeedbackFate::Sent), 1);
+    EXPECT_EQ(booked(FeedbackFate::NotJson), 1);
+    expectBooksClose();
+}
+
+TEST_F(UploadTest, TheBagDecidesOnTheEndpoint)
+{
+    begin();
+    LogCapture log;
+    const auto install = [this](std::string bag) {
+        assembly().bagController->forceFetchBag(Value(1000));
+        device.drain();
+        respond(std::move(bag));
+    };
+    appear();
+    flushSession();
+    install(R"({"version": "1001", "feedbackEnabled": false, "feedbackURL": "https://f.example/feedback"})");
+    upload();
+    EXPECT_TRUE(uploads().empty());
+    EXPECT_TRUE(sessionFiles().empty()) << "dropped all the same";
+    EXPECT_EQ(log.count("Server endpoint not set"), 1);
+    EXPECT_EQ(booked(FeedbackFate::EndpointUnset), 2);
+    expectBooksClose();
+}
+
+TEST_F(UploadTest, OnePassReadsEveryFileOnce)
+{
+    begin();
+    for (int i = 0; i < 3; ++i) {
+        appear();
+        flushSession();
+    }
+    EXPECT_EQ(sessionFiles().size(), 3u);
+    for (auto& [path, contents] : device.files.files)
+        if (path.filename() == "session.2") contents.resize(12); // unreadable
+    upload();
+    upload();
+    EXPECT_EQ(uploads().size(), 2u);
+    EXPECT_TRUE(sessionFiles().empty()) << "a file that can't be read is deleted, too";
+    EXPECT_EQ(booked(FeedbackFate::Unreadable), 2);
+    expectBooksClose();
+}
+
+TEST_F(UploadTest, StatesOfTheActivity)
+{
+    begin();
+    const auto& [criteria, handler] = device.activities.registered.at("com.quorvane.tavrind.flusher.background");
+    EXPECT_EQ(criteria.delay, platform::Duration(300s));
+    EXPECT_EQ(criteria.interval, platform::Duration(600s));
+    EXPECT_EQ(criteria.gracePeriod, platform::Duration(300s));
+    EXPECT_TRUE(criteria.repeating && criteria.allowBattery);
+
+    LogCapture log;
+    auto run = device.activities.run("com.quorvane.tavrind.flusher.background");
+    EXPECT_EQ(run->state(), ActivityState::Continue);
+    EXPECT_FALSE(device.transactions.open().empty()) << "the process is wanted";
+    device.drain();
+    EXPECT_EQ(run->state(), ActivityState::Done);
+    EXPECT_TRUE(device.transactions.open().empty());
+
+    appear();
+    flushSession();
+    assembly().backgroundFlusher->setStopFlushing(true);
+    run = device.activities.run("com.quorvane.tavrind.flusher.background");
+    EXPECT_EQ(run->state(), ActivityState::Done);
+    device.drain();
+    EXPECT_EQ(sessionFiles().size(), 1u) << "stopped";
+    assembly().backgroundFlusher->setStopFlushing(false);
+
+    device.activities.run("com.quorvane.tavrind.flusher.background", true);
+    device.drain();
+    EXPECT_TRUE(log.has(platform::LogLevel::Fault, "Tavrin_Flusher", "State transition from 2 to 4 invalid"));
+    EXPECT_TRUE(log.has(platform::LogLevel::Fault, "Tavrin_Flusher", "State transition from 2 to 5 invalid"));
+    EXPECT_TRUE(sessionFiles().empty()) << "the pass ran all the same";
+}
+
+TEST_F(UploadTest, FaultsOfTheDiskLoseOneSessionAndNothingElse)
+{
+    struct Case {
+        const char* operation;
+        const char* path; ///< part of it
+        FeedbackFate fate;
+        std::int64_t lost;
+    };
+    for (const Case& each : {Case{"create", "session.", FeedbackFate::NoContainer, 2},
+                             {"append", "session.", FeedbackFate::NoContainer, 2},
+                             {"create", "flusher_", FeedbackFate::NoBody, 2},
+                             {"append", "flusher_", FeedbackFate::NoBody, 2},
+                             {"info", "session.", FeedbackFate::Unreadable, 2},
+                             {"read", "session.", FeedbackFate::Unreadable, 2}}) {
+        begin();
+        const std::int64_t before = booked(each.fate);
+        device.files.fault = [&each](std::string_view operation, const std::filesystem::path& path) {
+            return operation == each.operation && path.string().contains(each.path) ? ENOSPC : 0;
+        };
+        appear();
+        flushSession();
+        upload();
+        device.files.fault = {};
+        EXPECT_TRUE(uploads().empty()) << each.operation << each.path;
+        EXPECT_EQ(booked(each.fate) - before, each.lost) << each.operation << each.path;
+        EXPECT_EQ(typesIn(decoded(*uploadOne())), (Types{"search_view_appear", "session_end"})) << each.operation;
+        expectBooksClose();
+    }
+}
+
+TEST_F(UploadTest, AnUploadThatCannotBeMadeIsDropped)
+{
+    begin();
+    device.background.sessions.at("com.quorvane.tavrind.flusher.nsurlsession")->refuse = true;
+    appear();
+    flushSession();
+    upload();
+    EXPECT_EQ(booked(FeedbackFate::NoTask), 2);
+    expectBooksClose();
+}
+
+TEST_F(UploadTest, BooksAcrossKills)
+{
+    begin();
+    appear(); // lies in an open file when the process is killed
+    restart();
+    EXPECT_EQ(booked(FeedbackFate::Closed), 1);
+    connection = client();
+    upload();
+    EXPECT_EQ(typesIn(decoded(*uploads().at(0))), Types{"search_view_appear"});
+    EXPECT_EQ(booked(FeedbackFate::Uploading), 1);
+    expectBooksClose();
+
+    // Closed and saved, then gone from under the daemon.
+    appear();
+    flushSession();
+    device.files.files.erase("/caches/com.quorvane.tavrind/session.2");
+    restart();
+    EXPECT_EQ(booked(FeedbackFate::Unknown), 3) << "of two in the file and one in an upload, none was found";
+    expectBooksClose();
+    restart();
+    EXPECT_EQ(booked(FeedbackFate::Unknown), 3);
+    expectBooksClose();
+}
+
+TEST_F(UploadTest, DamagedBooksBeginAnew)
+{
+    for (const char* damage : {"", "[1]", "{\"recorded\": \"x\", \"sent\": -5, \"dropped\": 7}", "\xff"}) {
+        device.files.directories.insert("/state/com.quorvane.tavrind");
+        begin();
+        device.files.files["/state/com.quorvane.tavrind/feedback-books.json"] = damage;
+        restart();
+        expectBooksClose();
+        EXPECT_EQ(booked(FeedbackFate::Sent), 0) << damage;
+    }
+}
+
+// The diagnostic bridge
+
+struct BridgeTest : UploadTest {
+    std::shared_ptr<FakeConnection> tool()
+    {
+        const auto call = connection->call("ListenToFlusher");
+        device.drain();
+        auto connected = device.ipc.connect(*call->argument(0).asString());
+        device.drain();
+        return connected;
+    }
+    void intent(FakeConnection& tool, std::uint64_t number)
+    {
+        tool.call("InitiateConnectionWithIntent", {Value(number)});
+        device.drain();
+    }
+    static Types signals(FakeConnection& tool)
+    {
+        Types names;
+        for (const auto& push : tool.takePushes()) names.push_back(push.signal);
+        return names;
+    }
+};
+
+TEST_F(BridgeTest, EventsAreShownLive)
+{
+    begin();
+    const auto watcher = tool();
+    appear();
+    EXPECT_TRUE(watcher->takePushes().empty()) << "before it asked";
+    intent(*watcher, 1);
+    report("ZRDidGoToSiteFeedback", {{"input", "example.org"}, {"timestamp", 7'654'321'000}}, 4);
+    auto pushes = watcher->takePushes();
+    ASSERT_EQ(pushes.size(), 1u);
+    EXPECT_EQ(pushes[0].signal, "ReceivedFeedbackDescription");
+    const auto event = platform::parseJson(*pushes[0].message.args[0].asString());
+    EXPECT_EQ(*event, (Value(Dictionary{
+                          {"input", "example.org"}, {"query_id", 4}, {"type", "did_go_to_site"}, {"timestamp", 7654}})));
+    intent(*watcher, 7);
+    EXPECT_TRUE(watcher->takePushes().empty()) << "no such command";
+    watcher->end();
+    device.drain();
+    appear();
+    const auto next = tool();
+    intent(*next, 1);
+    appear();
+    EXPECT_EQ(signals(*next), Types{"ReceivedFeedbackDescription"});
+}
+
+TEST_F(BridgeTest, DumpEndsSessionsAndShowsTheBodies)
+{
+    begin();
+    const auto dumper = tool();
+    intent(*dumper, 2);
+    EXPECT_EQ(signals(*dumper), Types{"WorkDone"});
+    EXPECT_TRUE(assembly().backgroundFlusher->stopFlushing());
+    appear();
+    intent(*dumper, 3);
+    auto pushes = dumper->takePushes();
+    ASSERT_EQ(pushes.size(), 2u);
+    EXPECT_EQ(pushes[0].signal, "FlushedData");
+    EXPECT_EQ(pushes[1].signal, "WorkDone");
+    const auto body = devserver::inflateRaw(pushes[0].message.args[0].asBytes()->view(), 1u << 20);
+    EXPECT_EQ(typesIn(platform::parseJson(*body).value()), (Types{"search_view_appear", "session_end"}));
+    EXPECT_EQ(uploads().size(), 1u) << "it is uploaded, too";
+    EXPECT_FALSE(assembly().backgroundFlusher->stopFlushing());
+
+    intent(*dumper, 3);
+    EXPECT_EQ(signals(*dumper), Types{"WorkDone"}) << "nothing left";
+}
+
+TEST_F(BridgeTest, EachToolGetsWhatItAskedFor)
+{
+    begin();
+    const auto bodies = tool();
+    const auto events = tool();
+    intent(*bodies, 0); // the other one connected last
+    intent(*events, 1);
+    appear();
+    EXPECT_EQ(signals(*events), Types{"ReceivedFeedbackDescription"});
+    intent(*events, 3);
+    EXPECT_EQ(signals(*events), (Types{"ReceivedFeedbackDescription", "WorkDone"})) << "the session's end, and its own";
+    EXPECT_EQ(signals(*bodies), Types{"FlushedData"});
+}
+
+// The stream
+
+TEST(CompressedOutputStreamTest, RoundTripAndDigest)
+{
+    for (const std::size_t size : {std::size_t{0}, std::size_t{1}, std::size_t{4096}, std::size_t{300'000}}) {
+        std::string text;
+        for (std::size_t i = 0; text.size() < size; ++i) text += std::to_string(i * 2654435761u);
+        text.resize(size);
+        CompressedOutputStream stream;
+        EXPECT_EQ(stream.write("x"), -1) << "not open yet";
+        stream.open();
+        for (std::size_t at = 0; at < size; at += 999)
+            EXPECT_EQ(stream.write(std::string_view(text).substr(at, 999)),
+                      static_cast<std::ptrdiff_t>(std::min<std::size_t>(999, size - at)));
+        stream.close();
+        EXPECT_EQ(stream.streamStatus(), StreamStatus::Closed);
+        const auto& packed = static_cast<const MemoryOutputStream&>(stream.outputStream()).contents();
+        EXPECT_EQ(devserver::inflateRaw(packed, 1u << 20).value(), text);
+        EXPECT_EQ(stream.dataDigestForStream(), sha512(text));
+    }
+}
+
+} // namespace
+} // namespace tavrin::test

@@ -1,0 +1,117 @@
+#pragma once
+
+#include "CoreTavrin/TAVFeedback.h"
+#include "platform/BackgroundSession.h"
+#include "searchrecords/ZRRecords.h"
+#include "tavrind/BackgroundActivitiesManager.h"
+#include "tavrind/FeedbackBooks.h"
+#include "tavrind/FileContainer.h"
+#include "tavrind/TavrinPersistentStorage.h"
+#include "tests/support/DaemonFixture.h"
+#include "tools/devserver/Compression.h"
+
+namespace tavrin::test {
+
+/// The daemon with its real sessions: feedback goes from the clients to files and uploads.
+struct FeedbackTest : DaemonTest {
+    FeedbackTest()
+    {
+        recordFeedback = false;
+        device.files.directories.insert("/tmp");
+    }
+
+    /// A daemon with a bag, and a client.
+    void begin(bool shared = true)
+    {
+        device.userDefaults.set("TAVSharedSession", shared);
+        start();
+        deliverBag(kFeedbackBag);
+        connection = client();
+        upload(); // what the daemon says of its bag
+        _uploadsBefore = allUploads().size();
+    }
+    /// The daemon is killed and started again.
+    void restart()
+    {
+        start();
+        device.drain();
+        _uploadsBefore = 0;
+    }
+
+    void report(const std::string& className, Dictionary fields = {}, std::int64_t queryId = 1)
+    {
+        fields.set("class", className);
+        connection->call("ReportEvent", {"event", queryId, std::move(fields)});
+        device.drain();
+    }
+    void appear() { report("ZRSearchViewAppearFeedback", {{"isOnLockScreen", true}}); }
+
+    std::shared_ptr<ClientSessionManager> manager() { return assembly().clientSessionManager; }
+    void flushSession()
+    {
+        manager()->flushSession({});
+        device.drain();
+    }
+    /// One pass of the background activity.
+    void upload()
+    {
+        device.activities.run("com.quorvane.tavrind.flusher.background");
+        device.drain();
+    }
+    using UploadTask = platform::test::FakeBackgroundSessions::Task;
+    std::vector<std::shared_ptr<UploadTask>>& allUploads()
+    {
+        return device.background.sessions.at("com.quorvane.tavrind.flusher.nsurlsession")->tasks;
+    }
+    /// Those since the daemon began, or was restarted.
+    std::vector<std::shared_ptr<UploadTask>> uploads()
+    {
+        const auto& all = allUploads();
+        return {all.begin() + static_cast<std::ptrdiff_t>(_uploadsBefore), all.end()};
+    }
+    /// An upload's JSON.
+    static Value decoded(const UploadTask& task)
+    {
+        const auto text = devserver::inflateRaw(task.body, 64u << 20);
+        return text ? platform::parseJson(*text).value_or(Value()) : Value();
+    }
+    /// The types of an upload's events, in order.
+    static std::vector<std::string> typesIn(const Value& session)
+    {
+        std::vector<std::string> types;
+        for (std::size_t i = 0; i < session["fb"].count(); ++i) types.push_back(*session["fb"][i]["type"].asString());
+        return types;
+    }
+
+    /// The session files, by name.
+    std::vector<std::string> sessionFiles()
+    {
+        std::vector<std::string> names;
+        for (const auto& [path, contents] : device.files.files)
+            if (path.filename().string().starts_with("session.")) names.push_back(path.filename());
+        return names;
+    }
+    std::int64_t booked(FeedbackFate fate) { return assembly().feedbackBooks.count(fate); }
+    /// Every event is in exactly one place.
+    void expectBooksClose()
+    {
+        std::int64_t sum = 0;
+        for (std::size_t fate = 0; fate < kFeedbackFates; ++fate) {
+            const std::int64_t events = booked(static_cast<FeedbackFate>(fate));
+            EXPECT_GE(events, 0) << fate;
+            sum += events;
+        }
+        EXPECT_EQ(assembly().feedbackBooks.recorded(), sum) << platform::toJson(assembly().feedbackBooks.description());
+    }
+
+    static constexpr const char* kFeedbackBag =
+        R"({"version": "9", "searchURL": "https://s.example/search", "feedbackURL": "https://f.example/feedback?x=1",
+        "crowdsourcingURL": "https://f.example/crowd?y=2", "clients": {"news": {"feedbackEnabled": false}}})";
+
+    std::shared_ptr<FakeConnection> connection;
+
+private:
+    std::size_t _uploadsBefore = 0;
+};
+
+} // namespace tavrin::test
