@@ -1,15 +1,15 @@
 #include <algorithm>
 #include <cctype>
-#include <iterator>
-#include <sstream>
+#include <regex>
 #include <string>
 #include <utility>
 #include <vector>
 
-#include <gtest/gtest.h>
+#include <gmock/gmock.h>
 
-#include "searchrecords/ZREnums.h"
+#include "tavrind/FeedbackEnumerations.h"
 #include "tavrind/TavrinSessionFeedback.h"
+#include "tests/records/FeedbackExamples.h"
 
 namespace tavrin {
 namespace {
@@ -44,72 +44,65 @@ std::string plain(std::string name)
     return name;
 }
 
-/// Checks the enumerators of E against the names that the service reads at their positions. The service's name may
-/// begin with more than ours has: "tophit_no" is No.
-template <class E> void expectPositions(const std::string& serviceNames)
+/// The strings that the page has for an enumeration: "| `NAME` | "a", "b" |".
+std::vector<std::string> documentedStrings(const std::string& name)
 {
-    std::istringstream stream(serviceNames);
-    const std::vector<std::string> expected(std::istream_iterator<std::string>(stream), {});
-    const std::vector<std::string> names = enumerators<E>();
-    EXPECT_EQ(names.size(), expected.size()) << serviceNames;
-    for (std::size_t i = 0; i < std::min(names.size(), expected.size()); ++i)
-        EXPECT_TRUE(plain(expected[i]).ends_with(plain(names[i]))) << names[i] << " stands for " << expected[i];
+    static const std::string kPage = feedbackPage();
+    const std::size_t start = kPage.find("| `" + name + "` |");
+    if (start == std::string::npos) return {};
+    const std::string row = kPage.substr(start, kPage.find('\n', start) - start);
+    static const std::regex kString("\"([^\"]*)\"");
+    std::vector<std::string> strings;
+    for (std::sregex_iterator match(row.begin(), row.end(), kString), end; match != end; ++match)
+        strings.push_back((*match)[1]);
+    return strings;
 }
 
-TEST(Enumerations, StandAtThePositionsThatTheServiceReads)
+/// Checks that the enumerators of E, their strings and the page agree. A string may begin with more than the enumerator
+/// has: "tophit_no" is No.
+template <class E, class ToString> void expectStrings(const std::string& name, const ToString& toString)
 {
-    expectPositions<SearchViewAppearTrigger>(
-        "unknown swipe_down today_view lock_screen breadcrumb keyboard_shortcut mouse_click_on_menu app_launch new_tab "
-        "tap_to_input new_window click tab_switch orb contextual_menu lookup_hint_tap lookup_tap swipe_up swipe_left "
-        "swipe_right start_composing find_popular_items pull_down_home_screen notification_center partial_pull_down "
-        "unlock_device did_enter_foreground");
-    expectPositions<SearchViewDisappearTrigger>(
-        "unknown killed home_button task_switcher cancel escape close_window_by_keyboard close_window_by_mouse "
-        "minimize_window_by_keyboard minimize_window_by_mouse switched_to_other_app quit_app lock_button "
-        "click_notification_banner phone_call lost_focus done swipe_down swipe_up swipe_left swipe_right share_button "
-        "device_idle did_enter_background go_to_site");
-    expectPositions<CardViewDisappearTrigger>("unknown back swipe pop done replaced");
-    expectPositions<StartSearchTrigger>(
-        "unknown new_character ime_commit backspace voice_search dictation copy_and_paste drag_and_drop suggestion "
-        "prefetch partial_suggestion lookup cross_button show_more card image_load bag unlock_device correction warm");
-    expectPositions<EndpointType>("unknown tavrin google yahoo bing duckduckgo tavrin_search tavrin_image yandex baidu "
-                                  "tavrin_bag tavrin_card tavrin_warm");
-    expectPositions<LookupSelectionType>("lookup_default lookup_explicit lookup_hint_tap");
-    expectPositions<IndexType>(
-        "unknown vistrel calculator core_mirva wendral_bookmarks wendral_history lookup_dictionary");
-    expectPositions<ResultType>(
-        "unknown tavrin local core_vistrel ns_user_activity wendral_tophit calculator conversion "
-        "dictionary_definition google yahoo bing duckduckgo yandex baidu");
-    expectPositions<TopHit>("tophit_no tophit_should_be tophit_must_be");
-    expectPositions<VisibleResultsTrigger>(
-        "unknown result_list_updated scroll show_more peek pop show_less card_swipe click view_resized scroll_up "
-        "scroll_down resume_search arrow_up arrow_down");
-    expectPositions<ResultEngagementTrigger>(
-        "unknown enter tap click double_click peek pop reveal arrow_up arrow_down three_fingers_tap swipe "
-        "forced_after_list_update shortcut");
-    expectPositions<ResultEngagementDestination>(
-        "unknown card punchout none insert find_on_page last_search maps_card tunrel_sheet hosted_html_page");
-    expectPositions<ResultActionTarget>("unknown directions call message play view open");
-    expectPositions<CardEngagementTrigger>("unknown enter tap click double_click peek pop reveal arrow_up arrow_down");
-    expectPositions<CardType>("unknown normal maps tunrel_sheet hosted_html_page");
-    expectPositions<CardActionTarget>(
-        "unknown body phone home_page address directions_to_here directions_from_here business_photo business_review "
-        "write_a_review more_info report_a_problem preview details play buy rent artist reviews related more trailer "
-        "season episode");
-    expectPositions<MapsCardFeedback>(
-        "unknown phone_number website add_contact share directions_to_here directions_from_here dismissed "
-        "report_a_problem edit_contact delete_contact skeldor_tour all_photos photo add_photo all_reviews review "
-        "write_review deal checkin more_info postal_address");
-    expectPositions<ProductPageResult>(
-        "canceled_product_page closed_product_page product_page_download_finished user_hit_goto_store_button "
-        "user_purchased_item user_hit_custom_right_bar_button");
-    expectPositions<SuggestionType>("unknown tavrin proactive recents");
-    expectPositions<ClearInputTrigger>("unknown cross_button cut backspace");
-    expectPositions<SkipSearchTrigger>("unknown less_than_minimum_query_length bag_disabled bag_fetch_failed cache_hit "
-                                       "empty_query_input query_input_with_uri_scheme_prefix");
-    expectPositions<SectionEngagementTrigger>("unknown search_in_app show_more show_less");
-    expectPositions<SectionHeaderType>("unknown search_in_app show_more normal");
-    expectPositions<CustomFeedbackType>("unknown wendral_autofill crowdsourcing vistrel_result_features");
+    SCOPED_TRACE(name);
+    const std::vector<std::string> documented = documentedStrings(name);
+    const std::vector<std::string> names = enumerators<E>();
+    ASSERT_FALSE(documented.empty());
+    ASSERT_EQ(names.size(), documented.size());
+    ASSERT_EQ(enumStrings<E>().size(), documented.size());
+    for (std::size_t i = 0; i < names.size(); ++i) {
+        EXPECT_EQ(toString(static_cast<E>(i)), platform::Value(documented[i]));
+        EXPECT_TRUE(plain(documented[i]).ends_with(plain(names[i]))) << names[i] << " stands for " << documented[i];
+    }
+    for (const std::int64_t beyond : {static_cast<std::int64_t>(names.size()), std::int64_t{-1}, INT64_MIN, INT64_MAX})
+        EXPECT_EQ(toString(static_cast<E>(beyond)), platform::Value(documented[0])) << beyond;
+}
+
+TEST(Enumerations, HaveTheStringsThatTheServiceReads)
+{
+    expectStrings<SearchViewAppearTrigger>("SearchViewAppearTrigger", appearEventEnumToString);
+    expectStrings<SearchViewDisappearTrigger>("SearchViewDisappearTrigger", disappearEventEnumToString);
+    expectStrings<CardViewDisappearTrigger>("CardViewDisappearTrigger", disappearEventEnumToString);
+    expectStrings<StartSearchTrigger>("StartSearchTrigger", triggerEventEnumToString);
+    expectStrings<EndpointType>("EndpointType", endpointTypeEnumToString);
+    expectStrings<LookupSelectionType>("LookupSelectionType", lookupSelectionTypeEnumToString);
+    expectStrings<IndexType>("IndexType", indexTypeEnumToString);
+    expectStrings<ResultType>("ResultType", searchResultTypeEnumToString);
+    expectStrings<TopHit>("TopHit", topHitEnumToString);
+    expectStrings<VisibleResultsTrigger>("VisibleResultsTrigger", triggerEventEnumToString);
+    expectStrings<ResultEngagementTrigger>("ResultEngagementTrigger", triggerEventEnumToString);
+    expectStrings<ResultEngagementDestination>("ResultEngagementDestination", destinationTypeEnumToString);
+    expectStrings<ResultActionTarget>("ResultActionTarget", actionTargetTypeEnumToString);
+    expectStrings<CardEngagementTrigger>("CardEngagementTrigger", triggerEventEnumToString);
+    expectStrings<CardType>("CardType", cardTypeEnumToString);
+    expectStrings<CardActionTarget>("CardActionTarget", actionTargetTypeEnumToString);
+    expectStrings<MapsCardFeedback>("MapsCardFeedback", feedbackTypeEnumToString);
+    expectStrings<ProductPageResult>("ProductPageResult", productPageResultEnumToString);
+    expectStrings<SuggestionType>("SuggestionType", suggestionTypeEnumToString);
+    expectStrings<ClearInputTrigger>("ClearInputTrigger", triggerEventEnumToString);
+    expectStrings<SkipSearchTrigger>("SkipSearchTrigger", triggerEventEnumToString);
+    expectStrings<SectionEngagementTrigger>("SectionEngagementTrigger", triggerEventEnumToString);
+    expectStrings<SectionHeaderType>("SectionHeaderType", headerTypeEnumToString);
+    EXPECT_THAT(enumerators<CustomFeedbackType>(),
+                testing::ElementsAre("Unknown", "WendralAutofill", "Crowdsourcing", "VistrelResultFeatures"));
 }
 
 TEST(Enumerations, SessionEndReasonsHaveTheirTexts)

@@ -208,7 +208,8 @@ TEST(RecordClasses, FieldsRefuseRecordsOfOtherClasses)
 TEST(RecordClasses, AnEventSurvivesARecordThatIsNoneOfAnEvent)
 {
     for (const char* name : {"ZRLater", "ZRSearchResult"}) {
-        const Value inner = Dictionary{{"class", name}, {"x", Dictionary{{"class", "ZRLater"}}}, {"y", Value::Array{1}}};
+        const Value inner =
+            Dictionary{{"class", name}, {"x", Dictionary{{"class", "ZRLater"}}}, {"y", Value::Array{1}}};
         const Value value = Dictionary{{"class", "TavrinFeedback"}, {"feedback", inner}, {"query_id", 7}};
         for (const auto& decoded : decodedBothWays(value)) {
             ASSERT_TRUE(decoded) << decoded.error().description();
