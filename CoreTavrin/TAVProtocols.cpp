@@ -55,6 +55,24 @@ std::optional<std::shared_ptr<TAVSessionConfiguration>> configurationIn(const Va
     return found;
 }
 
+/// Dictionaries without their null entries, which can't travel. An array's nulls become empty dictionaries.
+Value withoutNulls(const Value& value)
+{
+    if (const Value::Array* array = value.asArray()) {
+        Value::Array kept;
+        for (const Value& element : *array)
+            kept.push_back(element.isNull() ? Value(Dictionary()) : withoutNulls(element));
+        return kept;
+    }
+    if (const Dictionary* dictionary = value.asDictionary()) {
+        Dictionary kept;
+        for (const auto& [key, entry] : *dictionary)
+            if (!entry.isNull()) kept.set(key, withoutNulls(entry));
+        return kept;
+    }
+    return value;
+}
+
 ipc::Message message(std::vector<Value> args)
 {
     return {std::move(args), {}};
@@ -225,7 +243,7 @@ ipc::Handler daemonHandler(std::weak_ptr<TAVDaemonXPC> object, std::weak_ptr<TAV
             daemon->feedback(text(arguments, 0),
                              replyThrough<Value::Array, OptionalError>(
                                  std::move(reply), [](Value::Array feedbacks, const OptionalError& error) {
-                                     return message({std::move(feedbacks), valueFromError(error)});
+                                     return message({withoutNulls(std::move(feedbacks)), valueFromError(error)});
                                  }));
         } else if (member == "ListenToFlusher") {
             daemon->listenToFlusher(replyThrough<std::string>(

@@ -25,7 +25,7 @@ struct FeedbackTest : DaemonTest {
     {
         device.userDefaults.set("TAVSharedSession", shared);
         start();
-        deliverBag(kFeedbackBag);
+        if (!tasks().empty()) deliverBag(kFeedbackBag); // else it is on disk
         connection = client();
         upload(); // what the daemon says of its bag
         _uploadsBefore = allUploads().size();

@@ -50,7 +50,7 @@ Result<FileInfo> MemoryFiles::info(const fs::path& path)
     if (const int error = faultOf("info", path)) return std::unexpected(Error::posix(error));
     if (directories.contains(path)) return FileInfo{.kind = FileInfo::Kind::Directory};
     if (!files.contains(path)) return std::unexpected(Error::posix(ENOENT));
-    return FileInfo{.size = files[path].size(), .created = created[path]};
+    return FileInfo{.size = files[path].size(), .created = created.contains(path) ? created[path] : dateFromSecondsSince1970(1767225600)};
 }
 
 Result<void> MemoryFiles::remove(const fs::path& path)

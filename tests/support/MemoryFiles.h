@@ -17,7 +17,7 @@ public:
     std::function<int(std::string_view operation, const std::filesystem::path& path)> fault;
 
     std::map<std::filesystem::path, std::string> files;
-    std::map<std::filesystem::path, Date> created; ///< where a test cares; else the epoch
+    std::map<std::filesystem::path, Date> created; ///< where a test cares; else 2026-01-01, when the test's clock began
     std::set<std::filesystem::path> directories;
 
     Result<Bytes> read(const std::filesystem::path& path, std::size_t maximumSize) override;

@@ -1,0 +1,293 @@
+#include <algorithm>
+#include <random>
+
+#include "platform/Record.h"
+#include "tavrind/ArchivedDataIterator.h"
+#include "tavrind/ClientSession.h"
+#include "tests/support/Examples.h"
+#include "tests/support/FeedbackFixture.h"
+
+namespace tavrin::test {
+namespace {
+
+using platform::test::LogCapture;
+
+constexpr const char* kDirectory = "/caches/com.quorvane.tavrind/";
+
+struct SessionFileTest : FeedbackTest {
+    SessionFileTest() { device.files.directories.insert("/caches/com.quorvane.tavrind"); }
+
+    std::shared_ptr<TavrinPersistentStorage> storage() { return assembly().persistentStorage; }
+    std::string& contents(const std::string& name) { return device.files.files.at(kDirectory + name); }
+    static std::shared_ptr<TavrinFeedback> feedback(std::string input, std::int64_t queryId = 1)
+    {
+        auto record = std::make_shared<ZRDidGoToSiteFeedback>();
+        record->input = std::move(input);
+        record->timestamp = 1'000'000;
+        return std::make_shared<TavrinFeedback>(std::move(record), queryId, kGuid, "Vistrel/4", 7);
+    }
+    static ClientSessionHeader header()
+    {
+        ClientSessionHeader header;
+        header.agent = "Vistrel/4";
+        header.userGuid = *platform::Uuid::parse(kGuid);
+        header.resourceVersions = Dictionary{{"TAVCorrectionDict", "3"}};
+        header.baseTime = platform::dateFromSecondsSince1970(1767225600);
+        header.firstUse = true;
+        return header;
+    }
+    /// A closed file with these events.
+    std::shared_ptr<FileContainer> closedFile(const std::vector<std::string>& inputs)
+    {
+        auto container = storage()->createFileContainerForWriting();
+        container->writeSessionHeader(header());
+        for (const std::string& input : inputs) {
+            assembly().feedbackBooks.record(FeedbackFate::Open);
+            container->writeFeedback(feedback(input), {});
+        }
+        storage()->closeSessionWithFileContainer(container);
+        device.drain();
+        return container;
+    }
+    /// A file of an earlier process, adopted as it is.
+    std::shared_ptr<FileContainer> adopted(const std::string& bytes)
+    {
+        device.files.files[std::string(kDirectory) + "session.5"] = bytes;
+        const std::filesystem::path path = std::string(kDirectory) + "session.5";
+        const std::uint64_t count = FileContainer::countFeedback(device.files, path);
+        assembly().feedbackBooks.find(FeedbackFate::Closed, count);
+        return std::make_shared<FileContainer>(
+            std::shared_ptr<const FileContainerStore>(std::shared_ptr<void>(), &storage()->store()), path, count);
+    }
+    static std::vector<std::string> inputsIn(ClientSession& session)
+    {
+        std::vector<std::string> inputs;
+        for (const auto& each : session.getSessionFeedbacks())
+            inputs.push_back(*std::dynamic_pointer_cast<ZRDidGoToSiteFeedback>(each->feedback)->input);
+        return inputs;
+    }
+
+    static constexpr const char* kGuid = "01234567-89AB-4DEF-8123-456789ABCDEF";
+};
+
+TEST_F(SessionFileTest, IsWhatTheFormatSays)
+{
+    start();
+    const auto container = closedFile({"example.org"});
+    EXPECT_EQ(platform::Bytes(contents(container->fileUrl().filename())), platform::Bytes(platform::test::hexDumpIn("formats.md")));
+    const auto session = container->read();
+    ASSERT_TRUE(session);
+    EXPECT_EQ(platform::archive(session->header()), platform::archive(header()));
+    EXPECT_EQ(session->getSessionFeedbacks().at(0)->clientQueryId, 7u);
+}
+
+TEST_F(SessionFileTest, CutAnywhereItGivesEveryWholeEventBeforeTheCut)
+{
+    start();
+    const std::vector<std::string> inputs{"a", "bb", "ccc", "dddd"};
+    const std::string whole = contents(closedFile(inputs)->fileUrl().filename());
+    std::vector<std::size_t> ends; // of the records
+    ArchivedDataIterator records{platform::Bytes(whole)};
+    while (records.skipObject()) ends.push_back(records.position());
+    ASSERT_EQ(ends.size(), 6u);
+    for (std::size_t cut = 0; cut <= whole.size(); ++cut) {
+        const auto session = adopted(whole.substr(0, cut))->read();
+        const auto recordsLeft = static_cast<std::size_t>(
+            std::ranges::count_if(ends, [cut](std::size_t end) { return end <= cut; }));
+        ASSERT_EQ(session != nullptr, recordsLeft >= 2) << cut;
+        if (!session) continue;
+        const std::vector expected(inputs.begin(), inputs.begin() + static_cast<long>(recordsLeft) - 2);
+        ASSERT_EQ(inputsIn(*session), expected) << cut;
+    }
+    expectBooksClose();
+}
+
+TEST_F(SessionFileTest, FlippedBitsLoseNothingBeforeThem)
+{
+    start();
+    const std::vector<std::string> inputs{"a", "bb", "ccc", "dddd", "eeeee"};
+    const std::string whole = contents(closedFile(inputs)->fileUrl().filename());
+    std::vector<std::size_t> ends;
+    ArchivedDataIterator records{platform::Bytes(whole)};
+    while (records.skipObject()) ends.push_back(records.position());
+
+    std::mt19937 random(20261125);
+    for (int i = 0; i < 10'000; ++i) {
+        std::string damaged = whole;
+        std::size_t first = whole.size();
+        for (int flips = 1 + static_cast<int>(random() % 4); flips > 0; --flips) {
+            const std::size_t at = random() % whole.size();
+            damaged[at] = static_cast<char>(damaged[at] ^ (1 << random() % 8));
+            first = std::min(first, at);
+        }
+        const auto session = adopted(damaged)->read();
+        const auto intact = std::ranges::count_if(ends, [first](std::size_t end) { return end <= first; });
+        if (intact < 2) continue;
+        ASSERT_TRUE(session) << i;
+        const auto all = session->getSessionFeedbacks();
+        ASSERT_GE(static_cast<long>(all.size()), intact - 2) << i;
+    }
+    expectBooksClose();
+}
+
+TEST_F(SessionFileTest, LimitsToTheByte)
+{
+    device.userDefaults.set("TAVSessionSizeLimit", 1000);
+    start();
+    LogCapture log;
+    auto container = storage()->createFileContainerForWriting();
+    container->writeSessionHeader(header());
+    device.drain();
+    const std::string name = container->fileUrl().filename();
+    const std::size_t overhead = 8 + platform::archive(*feedback(std::string(300, 'x'))).size() - 300;
+    const std::size_t room = 1000 - contents(name).size();
+    int called = 0;
+    const auto write = [&](std::size_t size) {
+        container->writeFeedback(feedback(std::string(size - overhead, 'x')), [&called] { ++called; });
+        device.drain();
+    };
+    write(room); // to exactly 1000 bytes
+    EXPECT_EQ(counter("filesizeexceeded"), 1);
+    EXPECT_EQ(log.count("exceeds max session size (1000)"), 1);
+    write(room - 1);
+    EXPECT_EQ(contents(name).size(), 999u) << "a smaller one still fits";
+    EXPECT_EQ(called, 2) << "fitting or not";
+
+    storage()->closeSessionWithFileContainer(container);
+    device.drain();
+    contents(name) += 'x'; // 1000
+    EXPECT_TRUE(container->read());
+    contents(name) += 'x';
+    EXPECT_FALSE(container->read());
+    EXPECT_EQ(counter("filetoolarge"), 1);
+}
+
+TEST_F(SessionFileTest, ARecordThatFailedIsNotThere)
+{
+    start();
+    auto container = storage()->createFileContainerForWriting();
+    container->writeSessionHeader(header());
+    int failing = 1;
+    device.files.fault = [&](std::string_view operation, const std::filesystem::path&) {
+        return operation == "append" && failing++ % 2 == 0 ? ENOSPC : 0;
+    };
+    device.drain(); // the version goes, the header fails
+    container->writeFeedback(feedback("x"), [] { FAIL() << "the file is closed"; });
+    device.drain();
+
+    container = storage()->createFileContainerForWriting();
+    failing = -1; // odd: the version and the header go
+    device.files.fault = {};
+    container->writeSessionHeader(header());
+    device.drain();
+    failing = 1;
+    device.files.fault = [&](std::string_view operation, const std::filesystem::path&) {
+        return operation == "append" && failing++ % 2 == 0 ? EIO : 0;
+    };
+    for (const char* input : {"1", "2", "3", "4", "5"}) container->writeFeedback(feedback(input), {});
+    storage()->closeSessionWithFileContainer(container);
+    device.drain();
+    EXPECT_EQ(inputsIn(*container->read()), (std::vector<std::string>{"1", "3", "5"}));
+}
+
+TEST_F(SessionFileTest, WhatIsNoSessionFileIsNotRead)
+{
+    start();
+    const auto framed = [](std::initializer_list<std::string> archives) {
+        std::string bytes;
+        for (const std::string& archive : archives) {
+            const std::uint64_t length = archive.size();
+            bytes.append(reinterpret_cast<const char*>(&length), sizeof(length)).append(archive);
+        }
+        return bytes;
+    };
+    const std::string version = platform::archiveValue(ClientSessionManager::tavrindUserAgent());
+    struct Case {
+        std::string bytes;
+        const char* says;
+    };
+    for (const Case& each : {
+             Case{"", "empty file"},
+             {std::string(8, '\0'), "out of range"},
+             {std::string(9, '\0'), "empty data file"},
+             {std::string(8, '\xff') + "x", "broken version string in file"},
+             {framed({platform::archiveValue(7)}), "version string not stored"},
+             {framed({platform::archiveValue("tavrind/0.0.1")}), "version not supported: tavrind/0.0.1"},
+             {framed({version}), "client session not stored"},
+             {framed({version, platform::archive(*feedback("x"))}), "client session not stored"},
+         }) {
+        LogCapture log;
+        EXPECT_FALSE(adopted(each.bytes)->read());
+        EXPECT_EQ(log.count(each.says), 1) << each.says;
+    }
+    // With a bare length behind the last event, the end is told, and nothing is lost.
+    LogCapture log;
+    EXPECT_TRUE(adopted(framed({version, platform::archive(header()), platform::archive(*feedback("x"))}) +
+                        std::string(8, '\0'))
+                    ->read());
+    EXPECT_EQ(log.count("out of range"), 1);
+    EXPECT_EQ(log.count("tavrin feedback expected"), 1);
+}
+
+// The directory
+
+TEST_F(SessionFileTest, NumbersGoOn)
+{
+    start();
+    struct Case {
+        std::vector<std::string> names;
+        const char* next;
+        std::size_t adopted;
+    };
+    for (const Case& each : {Case{{}, "session.1", 0},
+                             {{"session.3", "session.10", "bag.plist"}, "session.11", 2},
+                             {{"session.x", "session.", "session.-4", "session.+5", "session. 6"}, "session.1", 5},
+                             {{"session.99999999999999", "session.2147483647", "session.7"}, "session.8", 3},
+                             {{"session.0012"}, "session.13", 1}}) {
+        device.files.files.clear();
+        for (const std::string& name : each.names) device.files.files[kDirectory + name] = "x";
+        const auto scanned = std::make_shared<TavrinPersistentStorage>(assembly());
+        EXPECT_EQ(scanned->getAvailableSessionHandles().size(), each.adopted) << each.next;
+        EXPECT_EQ(scanned->createFileContainerForWriting()->fileUrl().filename(), each.next);
+    }
+}
+
+TEST_F(SessionFileTest, OldFilesAreDeleted)
+{
+    start();
+    device.files.files.clear();
+    const platform::Date now = device.clock.wallNow();
+    const auto place = [&](const char* name, std::chrono::seconds age) {
+        device.files.files[std::string(kDirectory) + name] = "x";
+        device.files.created[std::string(kDirectory) + name] = now - age;
+    };
+    place("session.1", std::chrono::hours(48) + std::chrono::seconds(1));
+    place("session.2", std::chrono::hours(47));
+    place("session.3", std::chrono::hours(-24 * 365)); // the clock was set back
+    TavrinPersistentStorage scanned(assembly());
+    EXPECT_EQ(sessionFiles(), (std::vector<std::string>{"session.2", "session.3"}));
+    EXPECT_EQ(counter("filetooold"), 1);
+}
+
+TEST_F(SessionFileTest, WhatStandsInTheWayIsLeftAlone)
+{
+    start();
+    device.files.files.clear();
+    const auto scanned = std::make_shared<TavrinPersistentStorage>(assembly());
+    device.files.directories.insert(std::string(kDirectory) + "session.1"); // since the scan
+    const auto container = scanned->createFileContainerForWriting();
+    ASSERT_TRUE(container);
+    EXPECT_EQ(container->fileUrl().filename(), "session.2");
+}
+
+TEST_F(SessionFileTest, LimitsThatAreNoneAreTheUsualOnes)
+{
+    for (const Value& limit : {Value(0), Value(-5), Value("x"), Value(0.5)}) {
+        device.userDefaults.set("TAVSessionSizeLimit", limit);
+        start();
+        EXPECT_EQ(storage()->store().maxFileSize, 4'194'304u) << platform::toJson(limit);
+    }
+}
+
+} // namespace
+} // namespace tavrin::test

@@ -1,0 +1,31 @@
+#pragma once
+
+#include <fstream>
+#include <sstream>
+#include <string>
+
+namespace platform::test {
+
+/// The bytes of the first block "hexdump" in a page of docs/: lines of an offset, bytes in hexadecimal, and what they
+/// mean behind a bar. Empty where there is none.
+inline std::string hexDumpIn(const std::string& page)
+{
+    std::ifstream file(std::string(SOURCE_DIR "/docs/") + page);
+    std::string bytes;
+    bool inside = false;
+    for (std::string line; std::getline(file, line);) {
+        if (line.starts_with("```")) {
+            if (inside) break;
+            inside = line == "```hexdump";
+            continue;
+        }
+        if (!inside) continue;
+        std::istringstream words(line.substr(0, line.find('|')));
+        std::string word;
+        words >> word; // the offset
+        while (words >> word) bytes += static_cast<char>(std::stoi(word, nullptr, 16));
+    }
+    return bytes;
+}
+
+} // namespace platform::test
