@@ -84,6 +84,7 @@ TEST(RecordClasses, EveryDeclaredRecordIsRegisteredUnderItsName)
     std::set<std::string> daemon = classesDeclaredIn("tavrind");
     EXPECT_TRUE(client.contains("ZRFeedback") && daemon.contains("TavrinFeedback"));
     daemon.insert(client.begin(), client.end());
+    daemon.erase("ClientSession"); // the header of session files, which alone read it
     const auto expectRegistered = [](const platform::RecordClasses& classes, const std::set<std::string>& declared) {
         std::set<std::string> registered;
         for (const auto& [name, make] : classes) {
