@@ -27,6 +27,20 @@ struct FilesTest : testing::Test {
         return stat(path.c_str(), &status) == 0 ? status.st_mode & 07777 : 0;
     }
 
+    /// Calls `write` where no file may have more than `size` bytes: a write beyond is cut short, as on a full disk.
+    template <class Write> static auto onFullDisk(rlim_t size, Write write)
+    {
+        rlimit before{};
+        getrlimit(RLIMIT_FSIZE, &before);
+        const auto handler = signal(SIGXFSZ, SIG_IGN);
+        const rlimit small{.rlim_cur = size, .rlim_max = before.rlim_max};
+        setrlimit(RLIMIT_FSIZE, &small);
+        auto result = write();
+        setrlimit(RLIMIT_FSIZE, &before);
+        signal(SIGXFSZ, handler);
+        return result;
+    }
+
     test::TemporaryDirectory directory;
     std::unique_ptr<FileSystem> files = makeSystemFiles();
 };
@@ -97,15 +111,8 @@ TEST_F(FilesTest, AWriteThatFailsLeavesTheOldFileAndNoOther)
     writeFile(directory / "file", "old");
     fs::create_directory(directory / "directory");
 
-    // The limit stands for a full disk: the write is cut short.
-    rlimit before{};
-    getrlimit(RLIMIT_FSIZE, &before);
-    const auto handler = signal(SIGXFSZ, SIG_IGN);
-    const rlimit small{.rlim_cur = 4096, .rlim_max = before.rlim_max};
-    setrlimit(RLIMIT_FSIZE, &small);
-    const auto full = files->writeAtomically(directory / "file", std::string(10'000, 'x'));
-    setrlimit(RLIMIT_FSIZE, &before);
-    signal(SIGXFSZ, handler);
+    const auto full =
+        onFullDisk(4096, [&] { return files->writeAtomically(directory / "file", std::string(10'000, 'x')); });
 
     EXPECT_EQ(failure(full), EFBIG);
     EXPECT_EQ(failure(files->writeAtomically(directory / "directory", "x")), EISDIR);
@@ -114,6 +121,24 @@ TEST_F(FilesTest, AWriteThatFailsLeavesTheOldFileAndNoOther)
     EXPECT_EQ(failure(files->createDirectories(directory / "file")), ENOTDIR);
     EXPECT_EQ(contents(directory / "file"), "old");
     EXPECT_EQ(files->list(directory.path)->size(), 2u) << "no temporary files are left";
+}
+
+TEST_F(FilesTest, AppendsWholeRecordsOrNothing)
+{
+    writeFile(directory / "taken", "x");
+    EXPECT_EQ(failure(files->createForAppending(directory / "taken")), EEXIST);
+    fs::create_symlink(directory / "elsewhere", directory / "link");
+    EXPECT_EQ(failure(files->createForAppending(directory / "link")), EEXIST) << "not followed";
+
+    const auto file = std::move(files->createForAppending(directory / "records").value());
+    EXPECT_EQ(mode(directory / "records"), 0600u);
+    const std::string kilobyte(1000, 'a');
+    EXPECT_TRUE(file->append({"head", kilobyte, "", "tail"}));
+    const auto cutShort = onFullDisk(1500, [&] { return file->append({"head", kilobyte}); });
+    EXPECT_EQ(failure(cutShort), EFBIG);
+    EXPECT_EQ(file->size(), 1008u);
+    EXPECT_TRUE(file->append({"b"}));
+    EXPECT_EQ(contents(directory / "records"), "head" + kilobyte + "tailb") << "the half-written record is cut off";
 }
 
 TEST_F(FilesTest, TellsWhatThereIs)
