@@ -1,0 +1,138 @@
+#include "platform/Sqlite.h"
+
+#include <cerrno>
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <sqlite3.h>
+
+#include "platform/Files.h"
+
+namespace platform {
+
+static_assert(Sqlite::kCorrupt == SQLITE_CORRUPT);
+
+namespace {
+
+struct Finalize {
+    void operator()(sqlite3_stmt* statement) const { sqlite3_finalize(statement); }
+};
+
+} // namespace
+
+void Sqlite::Close::operator()(sqlite3* database) const
+{
+    sqlite3_close(database);
+}
+
+std::unexpected<Error> Sqlite::failure() const
+{
+    return std::unexpected(Error::withReason(std::string(kSqliteErrorDomain),
+                                             sqlite3_extended_errcode(_database.get()) & 0xff,
+                                             sqlite3_errmsg(_database.get())));
+}
+
+Result<Sqlite> Sqlite::open(const std::filesystem::path& path)
+{
+    // SQLite takes the mode of its other files from the database's, and refuses a link anywhere in the path.
+    std::error_code error;
+    const auto directory = std::filesystem::canonical(path.parent_path(), error);
+    if (error) return std::unexpected(Error::posix(error.value(), path.parent_path().string()));
+    const std::filesystem::path real = directory / path.filename();
+    {
+        const FileHandle file(::open(real.c_str(), O_RDWR | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, 0600));
+        struct stat status {};
+        if (!file || fstat(file.fd(), &status) != 0) return std::unexpected(Error::posix(errno, real.string()));
+        if (!S_ISREG(status.st_mode)) return std::unexpected(Error::posix(EINVAL, real.string()));
+    }
+
+    sqlite3* database = nullptr;
+    const int opened = sqlite3_open_v2(real.c_str(), &database,
+                                       SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOMUTEX | SQLITE_OPEN_NOFOLLOW, nullptr);
+    Sqlite result(database);
+    if (opened != SQLITE_OK) {
+        if (!database) return std::unexpected(Error::posix(ENOMEM, real.string()));
+        return result.failure();
+    }
+    // A file that was meddled with must not make SQLite call what we didn't mean it to.
+    sqlite3_db_config(database, SQLITE_DBCONFIG_DEFENSIVE, 1, nullptr);
+    sqlite3_db_config(database, SQLITE_DBCONFIG_TRUSTED_SCHEMA, 0, nullptr);
+    // A write-ahead log of an exclusive database needs no shared memory, and costs one sync a transaction.
+    if (auto set =
+            result.execute("PRAGMA locking_mode = EXCLUSIVE; PRAGMA journal_mode = WAL; PRAGMA synchronous = FULL;"
+                           "PRAGMA wal_autocheckpoint = 256; PRAGMA cache_size = -512");
+        !set)
+        return std::unexpected(std::move(set.error()));
+    return result;
+}
+
+Result<void> Sqlite::execute(const char* statements)
+{
+    if (sqlite3_exec(_database.get(), statements, nullptr, nullptr, nullptr) != SQLITE_OK) return failure();
+    return {};
+}
+
+Result<void> Sqlite::run(std::string_view statement, std::initializer_list<Parameter> parameters,
+                         const std::function<void(const Row&)>& each)
+{
+    sqlite3_stmt* made = nullptr;
+    if (sqlite3_prepare_v2(_database.get(), statement.data(), static_cast<int>(statement.size()), &made, nullptr) !=
+        SQLITE_OK)
+        return failure();
+    const std::unique_ptr<sqlite3_stmt, Finalize> owner(made);
+    int position = 0;
+    for (const Parameter& parameter : parameters) {
+        ++position;
+        int bound = SQLITE_OK;
+        if (const auto* number = std::get_if<std::int64_t>(&parameter))
+            bound = sqlite3_bind_int64(made, position, *number);
+        else if (const auto* text = std::get_if<std::string_view>(&parameter))
+            // A null pointer would be a null.
+            bound = sqlite3_bind_text64(made, position, text->empty() ? "" : text->data(), text->size(), SQLITE_STATIC,
+                                        SQLITE_UTF8);
+        if (bound != SQLITE_OK) return failure();
+    }
+    int stepped = SQLITE_ROW;
+    while ((stepped = sqlite3_step(made)) == SQLITE_ROW)
+        if (each) each(Row(made));
+    if (stepped != SQLITE_DONE) return failure();
+    return {};
+}
+
+Result<void> Sqlite::transaction(const std::function<Result<void>()>& work)
+{
+    if (auto begun = execute("BEGIN IMMEDIATE"); !begun) return begun;
+    auto done = work();
+    if (done) done = execute("COMMIT");
+    if (!done && !sqlite3_get_autocommit(_database.get())) (void)execute("ROLLBACK");
+    return done;
+}
+
+std::int64_t Sqlite::lastInsertedRow() const
+{
+    return sqlite3_last_insert_rowid(_database.get());
+}
+
+bool Sqlite::isDamage(const Error& error)
+{
+    return error.domain == kSqliteErrorDomain && (error.code == kCorrupt || error.code == SQLITE_NOTADB);
+}
+
+bool Sqlite::Row::isNull(int column) const
+{
+    return sqlite3_column_type(_statement, column) == SQLITE_NULL;
+}
+
+std::int64_t Sqlite::Row::integer(int column) const
+{
+    return sqlite3_column_int64(_statement, column);
+}
+
+std::string_view Sqlite::Row::text(int column) const
+{
+    const auto* text = reinterpret_cast<const char*>(sqlite3_column_text(_statement, column));
+    return text ? std::string_view(text, static_cast<std::size_t>(sqlite3_column_bytes(_statement, column))) : "";
+}
+
+} // namespace platform
