@@ -18,6 +18,7 @@ class DeviceProfileSource;
 class InstalledApplications;
 class LocaleSource;
 class LocationSource;
+class NetworkStatus;
 class NotificationCenter;
 class ProcessIdentity;
 class RunLoop;
@@ -60,6 +61,7 @@ struct Device {
     ProcessIdentity& processes;
     SystemNotifier& systemNotifier;
     UrlLoader& urlLoader;
+    NetworkStatus& network;
     BackgroundSessions& backgroundSessions;
     ActivityScheduler& activities;
     ipc::Transport& ipc;

@@ -10,6 +10,7 @@
 #include "platform/InstalledApplications.h"
 #include "platform/LocaleSource.h"
 #include "platform/LocationSource.h"
+#include "platform/NetworkStatus.h"
 #include "platform/Log.h"
 #include "platform/NotificationCenter.h"
 #include "platform/Process.h"
@@ -160,6 +161,7 @@ struct TestDevice {
     FakeProcesses processes;
     FakeNotifier notifier;
     FakeUrlLoader loader;
+    NetworkStatus network; ///< nothing is known until a test sets it
     FakeBackgroundSessions background{files};
     FakeActivityScheduler activities;
     FakeTransport ipc{executor, clock};
@@ -185,6 +187,7 @@ struct TestDevice {
                   .processes = processes,
                   .systemNotifier = notifier,
                   .urlLoader = loader,
+                  .network = network,
                   .backgroundSessions = background,
                   .activities = activities,
                   .ipc = ipc};
