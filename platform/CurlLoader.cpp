@@ -1,11 +1,14 @@
 #include <algorithm>
 #include <arpa/inet.h>
 #include <atomic>
+#include <cerrno>
 #include <cmath>
 #include <cstring>
 #include <deque>
 #include <mutex>
+#include <sys/stat.h>
 #include <thread>
+#include <unistd.h>
 #include <vector>
 
 #include <curl/curl.h>
@@ -63,10 +66,10 @@ class CurlTask final : public UrlTask, public std::enable_shared_from_this<CurlT
 public:
     CurlTask(std::shared_ptr<Loader> loader, std::uint64_t identifier, UrlRequest request,
              UrlSessionConfiguration configuration, UrlSession::DataCompletion completion,
-             std::shared_ptr<Queue> delegateQueue)
+             std::shared_ptr<Queue> delegateQueue, std::optional<TransferFiles> files = std::nullopt)
         : _loader(std::move(loader)), _identifier(identifier), _request(std::move(request)),
           _configuration(std::move(configuration)), _completion(std::move(completion)),
-          _delegateQueue(std::move(delegateQueue))
+          _delegateQueue(std::move(delegateQueue)), _files(std::move(files))
     {}
     ~CurlTask() override { curl_slist_free_all(_headerList); }
 
@@ -108,7 +111,11 @@ private:
     [[nodiscard]] Duration timeout() const { return _request.timeout.value_or(_configuration.requestTimeout); }
     void progressed() { _lastProgress = std::chrono::steady_clock::now(); }
     std::size_t received(std::string_view bytes);
+    bool store(std::string_view bytes);
+    void forgetBody();
     std::size_t receivedHeader(std::string_view line);
+    [[nodiscard]] bool configureUpload();
+    std::size_t readUpload(char* buffer, std::size_t size);
     int mayConnect(const char* address);
     [[nodiscard]] long hop() const;
     void noteMarks();
@@ -120,6 +127,7 @@ private:
     const UrlSessionConfiguration _configuration;
     UrlSession::DataCompletion _completion;
     std::shared_ptr<Queue> _delegateQueue;
+    const std::optional<TransferFiles> _files;
     std::atomic<bool> _started = false; // handed to the loader, or ended without it
     std::atomic<bool> _cancelled = false;
 
@@ -128,6 +136,10 @@ private:
     std::chrono::steady_clock::time_point _lastProgress;
     double _start = 0; // on the monotonic clock
     std::string _body;
+    std::size_t _bodySize = 0; // what was received, whether it is in memory or not
+    std::uint64_t _uploaded = 0;
+    std::uint64_t _uploadSize = 0;
+    int _fileError = 0; // errno
     HttpHeaders _headers;
     std::size_t _headerSize = 0; // of all hops
     bool _tooLarge = false;
@@ -146,18 +158,62 @@ private:
 std::size_t CurlTask::received(std::string_view bytes)
 {
     progressed();
-    if (_body.empty()) {
-        curl_off_t length = -1;
-        curl_easy_getinfo(_easy, CURLINFO_CONTENT_LENGTH_DOWNLOAD_T, &length);
-        if (length > 0)
-            _body.reserve(std::min<std::size_t>(static_cast<std::size_t>(length), _configuration.maximumResponseSize));
-    }
-    if (_body.size() + bytes.size() > _configuration.maximumResponseSize) {
+    if (_bodySize + bytes.size() > _configuration.maximumResponseSize) {
         _tooLarge = true;
         return 0;
     }
-    _body.append(bytes);
+    if (_files) {
+        if (!store(bytes)) return 0;
+    } else {
+        if (_body.empty()) {
+            curl_off_t length = -1;
+            curl_easy_getinfo(_easy, CURLINFO_CONTENT_LENGTH_DOWNLOAD_T, &length);
+            const auto expected = static_cast<std::size_t>(std::max<curl_off_t>(length, 0));
+            _body.reserve(std::min(expected, _configuration.maximumResponseSize));
+        }
+        _body.append(bytes);
+    }
+    _bodySize += bytes.size();
     return bytes.size();
+}
+
+bool CurlTask::store(std::string_view bytes)
+{
+    if (!_files->download) return true;
+    for (std::size_t written = 0; written < bytes.size();) {
+        const ssize_t count = pwrite(_files->download.fd(), bytes.data() + written, bytes.size() - written,
+                                     static_cast<off_t>(_bodySize + written));
+        if (count < 0 && errno != EINTR) {
+            _fileError = errno;
+            return false;
+        }
+        if (count > 0) written += static_cast<std::size_t>(count);
+    }
+    return true;
+}
+
+/// The body of a redirect isn't the answer's.
+void CurlTask::forgetBody()
+{
+    _body.clear();
+    if (_bodySize > 0 && _files && _files->download && ftruncate(_files->download.fd(), 0) != 0) _fileError = errno;
+    _bodySize = 0;
+}
+
+std::size_t CurlTask::readUpload(char* buffer, std::size_t size)
+{
+    progressed();
+    ssize_t count = -1;
+    do count = pread(_files->upload.fd(), buffer, size, static_cast<off_t>(_uploaded));
+    while (count < 0 && errno == EINTR);
+    // A file that became shorter must not be sent as if it were whole.
+    if (count < 0 || (count == 0 && size > 0 && _uploaded < _uploadSize)) {
+        _fileError = count < 0 ? errno : EIO;
+        return CURL_READFUNC_ABORT;
+    }
+    _uploaded += static_cast<std::uint64_t>(count);
+    if (_files->progress && count > 0) _files->progress(_uploaded, _uploadSize);
+    return static_cast<std::size_t>(count);
 }
 
 std::size_t CurlTask::receivedHeader(std::string_view line)
@@ -171,7 +227,7 @@ std::size_t CurlTask::receivedHeader(std::string_view line)
     if (line.starts_with("HTTP/")) {
         noteMarks();
         _headers = {}; // of a redirect, or of an interim answer
-        _body.clear();
+        forgetBody();
         return line.size();
     }
     const std::size_t colon = line.find(':');
@@ -218,6 +274,31 @@ int CurlTask::mayConnect(const char* address)
     if (!_firstHopPublic) _firstHopPublic = isPublic;
     _forbiddenHop = *_firstHopPublic && !isPublic;
     return _forbiddenHop ? CURL_PREREQFUNC_ABORT : CURL_PREREQFUNC_OK;
+}
+
+bool CurlTask::configureUpload()
+{
+    struct stat status {};
+    if (fstat(_files->upload.fd(), &status) != 0) {
+        _fileError = errno;
+        return false;
+    }
+    _uploadSize = static_cast<std::uint64_t>(status.st_size);
+    curl_easy_setopt(_easy, CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(_uploadSize));
+    curl_easy_setopt(_easy, CURLOPT_READDATA, this);
+    curl_easy_setopt(
+        _easy, CURLOPT_READFUNCTION, +[](char* buffer, std::size_t size, std::size_t count, void* self) {
+            return static_cast<CurlTask*>(self)->readUpload(buffer, size * count);
+        });
+    // From its start, for a redirect that repeats the body and for a connection that turned out to be closed.
+    curl_easy_setopt(_easy, CURLOPT_SEEKDATA, this);
+    curl_easy_setopt(
+        _easy, CURLOPT_SEEKFUNCTION, +[](void* self, curl_off_t offset, int origin) {
+            if (origin != SEEK_SET || offset < 0) return CURL_SEEKFUNC_FAIL;
+            static_cast<CurlTask*>(self)->_uploaded = static_cast<std::uint64_t>(offset);
+            return CURL_SEEKFUNC_OK;
+        });
+    return true;
 }
 
 bool CurlTask::configure(CURL* handle)
@@ -273,11 +354,16 @@ bool CurlTask::configure(CURL* handle)
         curl_slist* extended = curl_slist_append(_headerList, line.c_str());
         if (extended) _headerList = extended;
     }
-    const bool hasBody = !_request.body.empty() || _request.method == "POST";
+    const bool hasUpload = _files && _files->upload;
+    const bool hasBody = hasUpload || !_request.body.empty() || _request.method == "POST";
     if (hasBody) {
         set(CURLOPT_POST, 1L);
-        set(CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(_request.body.size()));
-        set(CURLOPT_POSTFIELDS, _request.body.empty() ? "" : _request.body.data());
+        if (hasUpload) {
+            if (!configureUpload()) return false;
+        } else {
+            set(CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(_request.body.size()));
+            set(CURLOPT_POSTFIELDS, _request.body.empty() ? "" : _request.body.data());
+        }
         curl_slist* extended = curl_slist_append(_headerList, "Expect:");
         if (extended) _headerList = extended;
     }
@@ -305,6 +391,8 @@ void CurlTask::complete(CURLcode code, bool cancelled)
                                            : fmt::format("more than {} bytes", _configuration.maximumResponseSize));
     else if (_forbiddenHop)
         error = urlError(kUrlForbiddenRedirect, "redirected to a private address");
+    else if (_fileError != 0)
+        error = Error::posix(_fileError, "a transfer's file");
     else if (code == CURLE_UNSUPPORTED_PROTOCOL)
         error = unsupported();
     else if (code != CURLE_OK)
@@ -479,6 +567,11 @@ public:
     {
         return std::make_shared<CurlTask>(_loader, ++_lastIdentifier, std::move(request), _configuration,
                                           std::move(completion), _queue);
+    }
+    std::shared_ptr<UrlTask> transferTask(UrlRequest request, TransferFiles files, DataCompletion completion) override
+    {
+        return std::make_shared<CurlTask>(_loader, ++_lastIdentifier, std::move(request), _configuration,
+                                          std::move(completion), _queue, std::move(files));
     }
 
 private:

@@ -13,6 +13,7 @@
 #include "platform/Bytes.h"
 #include "platform/Date.h"
 #include "platform/Error.h"
+#include "platform/Files.h"
 #include "platform/Url.h"
 
 namespace platform {
@@ -100,6 +101,14 @@ public:
     [[nodiscard]] virtual Value timingData() const = 0;
 };
 
+/// Files in place of the bodies in memory, for loads of any size.
+struct TransferFiles {
+    FileHandle upload;   ///< sent whole, from its start, as the request's body; none: the request's own
+    FileHandle download; ///< an empty file that takes the answer's body; none: the body is counted and dropped
+    /// Is told how many bytes of an upload have left, on the loader's thread: it must only hand work on.
+    std::function<void(std::uint64_t sent, std::uint64_t expected)> progress;
+};
+
 /// Loads URLs. Any thread.
 class UrlSession {
 public:
@@ -111,11 +120,15 @@ public:
     virtual ~UrlSession() = default;
     /// `completion` runs on the session's delegate queue.
     [[nodiscard]] virtual std::shared_ptr<UrlTask> dataTask(UrlRequest request, DataCompletion completion) = 0;
+    /// The same with bodies in files; the completion's data is empty. Sending counts as progress like receiving. A file
+    /// that can't be read or written is an error of the load, in kPosixErrorDomain.
+    [[nodiscard]] virtual std::shared_ptr<UrlTask> transferTask(UrlRequest request, TransferFiles files,
+                                                                DataCompletion completion) = 0;
 };
 
 /// How a session loads.
 struct UrlSessionConfiguration {
-    /// Without anything received for this long a request times out.
+    /// Without anything received for this long a request times out; a transfer, without anything sent either.
     Duration requestTimeout = std::chrono::seconds(60);
     /// TCP Fast Open and TLS session tickets.
     bool allowFastOpenAndTickets = false;

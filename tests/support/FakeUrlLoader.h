@@ -43,6 +43,7 @@ public:
         bool resumed = false;
         bool finished = false;
         Value timing;
+        TransferFiles files; ///< of a transfer
 
     private:
         std::uint64_t _identifier;
@@ -61,6 +62,12 @@ public:
         {
             tasks.push_back(std::make_shared<Task>(tasks.size() + 1, std::move(request), std::move(completion), _queue));
             return tasks.back();
+        }
+        std::shared_ptr<UrlTask> transferTask(UrlRequest request, TransferFiles files, DataCompletion completion) override
+        {
+            auto task = dataTask(std::move(request), std::move(completion));
+            tasks.back()->files = std::move(files);
+            return task;
         }
         UrlSessionConfiguration configuration;
         std::vector<std::shared_ptr<Task>> tasks;
