@@ -12,9 +12,13 @@
 
 namespace platform {
 
+class Clock;
+class Executor;
+class NetworkStatus;
 class Queue;
 
-/// A transfer that outlives the process; see `BackgroundSession`. Any thread.
+/// A transfer that outlives the process; see `BackgroundSession`. Any thread but the run loop's: `resume`, `cancel` and
+/// `setNote` write to disk.
 class BackgroundTask : public UrlTask {
 public:
     /// What the owner wants to remember of the task, kept with it: a small JSON value, 4 KiB of text at most (a larger
@@ -41,11 +45,12 @@ public:
     /// The task has ended; once for every task, also for one of an earlier process. A response of any HTTP status is a
     /// completion without error. Once this has returned, the task is forgotten on disk too; a process killed before
     /// that reports the task again.
-    virtual void taskDidComplete(const std::shared_ptr<BackgroundTask>& task, const std::optional<UrlResponse>& response,
-                                 const std::optional<Error>& error) = 0;
+    virtual void taskDidComplete(const std::shared_ptr<BackgroundTask>& task,
+                                 const std::optional<UrlResponse>& response, const std::optional<Error>& error) = 0;
     /// No task is left of those that the session knew.
     virtual void sessionDidFinishEvents() {}
-    /// The session can keep no tasks (its store can't be opened): it runs in memory, and tasks end with the process.
+    /// The session's store can't be opened, or is another process's: it works in a temporary directory, and tasks end
+    /// with the process. Where that isn't possible either, new tasks are errors.
     virtual void sessionDidBecomeInvalid(const Error&) {}
 };
 
@@ -64,7 +69,7 @@ struct BackgroundSessionConfiguration {
     std::string caFile; ///< as for UrlSessionConfiguration
 };
 
-/// Uploads and downloads that survive the process. Any thread.
+/// Uploads and downloads that survive the process. Any thread but the run loop's: making a task writes to disk.
 ///
 /// A task is on disk, with its own copy of its body, before it is handed out; nothing moves before `resume()`. Tasks
 /// resumed by an earlier process go on when the session is made anew, and report to the delegate then; tasks that were
@@ -76,7 +81,10 @@ struct BackgroundSessionConfiguration {
 /// where it comes with Retry-After (RFC 9110, 10.2.3; a day at most), the session's other tasks to that host wait.
 ///
 /// An attempt that was under way when the process died is made again, with the same body: a service may see a body
-/// twice, never a part of it as the whole.
+/// twice, never a part of it as the whole. How a task ended is on disk before its owner is told.
+///
+/// The resource time-out is of lived time (`LivedTime`): suspend and days without the process count, leaps of the
+/// system clock don't. Destroying the session stops its transfers, for the next session of that name to take up.
 class BackgroundSession {
 public:
     virtual ~BackgroundSession() = default;
@@ -94,12 +102,23 @@ class BackgroundSessions {
 public:
     virtual ~BackgroundSessions() = default;
     /// `delegate` is told of the transfers on `delegateQueue`, a serial queue; those of an earlier process are taken up
-    /// now. Where the store can't be opened, the session works in memory and the delegate is told.
+    /// now. Where the store can't be opened, the session's tasks end with the process and the delegate is told. The
+    /// store is opened on a worker, and made with the first task.
     [[nodiscard]] virtual std::shared_ptr<BackgroundSession> make(BackgroundSessionConfiguration configuration,
                                                                   std::weak_ptr<BackgroundSessionDelegate> delegate,
                                                                   std::shared_ptr<Queue> delegateQueue) = 0;
 };
 
-[[nodiscard]] std::unique_ptr<BackgroundSessions> makeBackgroundSessions();
+/// What background sessions work with; all of it must outlive them.
+struct BackgroundEnvironment {
+    UrlLoader& loader;
+    NetworkStatus& network;
+    Clock& clock;
+    Executor& executor;
+    std::filesystem::path directory; ///< holds a directory for each session; made when there is something to keep
+    std::filesystem::path temporary; ///< where a session works whose store can't be opened
+};
+
+[[nodiscard]] std::unique_ptr<BackgroundSessions> makeBackgroundSessions(BackgroundEnvironment environment);
 
 } // namespace platform

@@ -15,6 +15,7 @@
 #include "platform/Ipc.h"
 #include "platform/LocaleSource.h"
 #include "platform/LocationSource.h"
+#include "platform/NetworkStatus.h"
 #include "platform/NotificationCenter.h"
 #include "platform/Process.h"
 #include "platform/RunLoop.h"
@@ -63,7 +64,14 @@ struct SystemDevice::Impl {
           applications(makeInstalledApplications(*files, dataDirectories(directories), runLoop, *clock)),
           processes(makeProcessIdentity()), notifier(makeSessionBusNotifier(runLoop)),
           ipc(ipc::makeBusTransport(runLoop, pool, *clock, directories.runtime / name)), loader(makeCurlLoader()),
-          backgroundSessions(makeBackgroundSessions()), activities(makeActivityScheduler()),
+          network(makeNetworkManagerStatus(runLoop)),
+          backgroundSessions(makeBackgroundSessions({.loader = *loader,
+                                                     .network = *network,
+                                                     .clock = *clock,
+                                                     .executor = pool,
+                                                     .directory = directories.state / name / "transfers",
+                                                     .temporary = directories.temporary})),
+          activities(makeActivityScheduler()),
           device{.clock = *clock,
                  .executor = pool,
                  .mainExecutor = runLoop,
@@ -81,6 +89,7 @@ struct SystemDevice::Impl {
                  .processes = *processes,
                  .systemNotifier = *notifier,
                  .urlLoader = *loader,
+                 .network = *network,
                  .backgroundSessions = *backgroundSessions,
                  .activities = *activities,
                  .ipc = *ipc}
@@ -109,6 +118,7 @@ struct SystemDevice::Impl {
     std::unique_ptr<SystemNotifier> notifier;
     std::unique_ptr<ipc::Transport> ipc;
     std::unique_ptr<UrlLoader> loader;
+    std::unique_ptr<NetworkStatus> network;
     std::unique_ptr<BackgroundSessions> backgroundSessions;
     std::unique_ptr<ActivityScheduler> activities;
     Device device;

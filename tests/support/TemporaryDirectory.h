@@ -12,9 +12,9 @@ namespace platform::test {
 
 /// A new directory, mode 0700, that goes with all that is in it.
 struct TemporaryDirectory {
-    TemporaryDirectory()
+    explicit TemporaryDirectory(const std::filesystem::path& parent = std::filesystem::temp_directory_path())
     {
-        std::string name = (std::filesystem::temp_directory_path() / "platform-XXXXXX").string();
+        std::string name = (parent / "platform-XXXXXX").string();
         path = mkdtemp(name.data());
     }
     ~TemporaryDirectory() { std::filesystem::remove_all(path); }

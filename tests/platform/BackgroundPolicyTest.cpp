@@ -1,0 +1,119 @@
+#include <gtest/gtest.h>
+
+#include "platform/BackgroundPolicy.h"
+#include "platform/LivedTime.h"
+#include "platform/NetworkStatus.h"
+#include "tests/support/ManualClock.h"
+
+namespace platform {
+namespace {
+
+using namespace std::chrono_literals;
+
+TEST(BackgroundPolicy, DelaysGrowToAnHour)
+{
+    const struct {
+        unsigned failures;
+        Duration shortest, longest;
+    } cases[]{{0, 15s, 30s},     {1, 15s, 30s},  {2, 30s, 60s},     {3, 1min, 2min},
+              {7, 16min, 32min}, {8, 30min, 1h}, {1000, 30min, 1h}, {4'000'000'000u, 30min, 1h}};
+    for (const auto& c : cases) {
+        EXPECT_EQ(retryDelay(c.failures, 0), c.shortest) << c.failures;
+        EXPECT_EQ(retryDelay(c.failures, 1), c.longest) << c.failures;
+        EXPECT_EQ(retryDelay(c.failures, 0.5), (c.shortest + c.longest) / 2) << c.failures;
+    }
+}
+
+TEST(BackgroundPolicy, RetryAfterIsSecondsOrADate)
+{
+    const Date now = dateFromSecondsSince1970(784111777); // Sun, 06 Nov 1994 08:49:37 GMT
+    const struct {
+        std::string_view field;
+        std::optional<Duration> wait;
+    } cases[]{
+        {"0", 0s},
+        {"120", 120s},
+        {"86400", 24h},
+        {"86401", 24h},
+        {"99999999999999999999999", 24h},
+        {"Sun, 06 Nov 1994 08:59:37 GMT", 10min},
+        {"Sunday, 06-Nov-94 08:59:37 GMT", 10min},
+        {"Sun, 06 Nov 1994 08:00:00 GMT", 0s},
+        {"Sun, 06 Nov 2094 08:49:37 GMT", 24h},
+        {"", std::nullopt},
+        {"-5", std::nullopt},
+        {"1.5", std::nullopt},
+        {"soon", std::nullopt},
+        {std::string_view("Sun, 06 Nov 1994 08:59:37 GMT                                            x"), std::nullopt},
+    };
+    for (const auto& c : cases) EXPECT_EQ(retryAfter(c.field, now), c.wait) << c.field;
+}
+
+TEST(LivedTime, CountsAbsenceAndSuspendButNoLeaps)
+{
+    const struct {
+        Duration system, ticks, passed;
+    } cases[]{
+        {5s, 5s, 5s},
+        {8h, 5s, 8h},
+        {4s, 5s, 5s},
+        {-10h, 5s, 5s},
+        {0s, 0s, 0s},
+        {24h * 300, 0s, 24h * 300},
+        {24h * 400, 5s, 5s},
+        {Duration::max(), 5s, 5s},
+        {Duration::min(), 0s, 0s},
+    };
+    for (const auto& c : cases) EXPECT_EQ(timePassed(c.system, c.ticks), c.passed) << c.system.count();
+}
+
+TEST(LivedTime, AMarkFromADamagedFileStillCounts)
+{
+    test::ManualClock clock;
+    for (const LivedTime::Mark& mark : {LivedTime::Mark{Duration::max(), Date::max()},
+                                        {Duration::min(), Date::min()},
+                                        {Duration(-1), Date()},
+                                        {1h, clock.wallNow() + 1000h}}) {
+        LivedTime time(clock, mark);
+        const Duration before = time.now();
+        EXPECT_GE(before, 0s);
+        clock.advance(1min, [] {});
+        EXPECT_EQ(time.now() - before, 1min);
+        EXPECT_EQ(time.mark().wall, clock.wallNow());
+    }
+}
+
+TEST(NetworkStatusTest, TellsChangesToWhoeverStillListens)
+{
+    int asked = 0;
+    NetworkStatus status([&] { ++asked; });
+    EXPECT_EQ(asked, 0);
+    EXPECT_EQ(status.current(), std::nullopt) << "not known before the source has answered";
+    int one = 0, two = 0;
+    auto first = status.observe([&](const NetworkState&) { ++one; });
+    const auto second = status.observe([&](const NetworkState& state) { two += state.metered ? 10 : 1; });
+    status.set({});
+    status.set({});
+    first.reset();
+    status.set({.metered = true});
+    EXPECT_EQ(asked, 1);
+    EXPECT_EQ(one, 1);
+    EXPECT_EQ(two, 11);
+}
+
+TEST(NetworkStatusTest, ReadsNetworkManagersNumbers)
+{
+    const struct {
+        std::uint32_t state, metered;
+        NetworkState expected;
+    } cases[]{
+        {70, 2, {true, false}}, {70, 1, {true, true}},   {70, 3, {true, true}},  {70, 4, {true, false}},
+        {60, 0, {true, false}}, {50, 0, {false, false}}, {20, 1, {false, true}}, {10, 0, {false, false}},
+        {0, 0, {true, false}},  {99, 99, {true, false}},
+    };
+    for (const auto& c : cases)
+        EXPECT_EQ(networkStateOf(c.state, c.metered), c.expected) << c.state << " " << c.metered;
+}
+
+} // namespace
+} // namespace platform
