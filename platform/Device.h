@@ -65,7 +65,7 @@ struct Device {
     BackgroundSessions& backgroundSessions;
     ActivityScheduler& activities;
     ipc::Transport& ipc;
-    std::vector<std::string> launchEvents{}; ///< names of what the service manager started the process for
+    std::vector<std::string> launchEvents{}; ///< names of what the service manager started the process for: units, sockets
 
     [[nodiscard]] std::shared_ptr<Queue> serialQueue(std::string label, Priority priority = Priority::Default) const;
     [[nodiscard]] std::shared_ptr<Queue> concurrentQueue(std::string label, Priority priority = Priority::Default) const;

@@ -11,6 +11,7 @@
 #include "platform/Counters.h"
 #include "platform/Device.h"
 #include "platform/DeviceProfile.h"
+#include "platform/DeviceUse.h"
 #include "platform/InstalledApplications.h"
 #include "platform/Ipc.h"
 #include "platform/LocaleSource.h"
@@ -27,9 +28,10 @@ namespace platform {
 
 namespace {
 
-/// The names of the sockets that the service manager started this process for.
+/// What the service manager started this process for: a timer, or else the names of its sockets.
 std::vector<std::string> launchEvents()
 {
+    if (const char* unit = std::getenv("TRIGGER_UNIT"); unit && *unit) return {unit};
     char** names = nullptr;
     std::vector<std::string> events;
     const int count = sd_listen_fds_with_names(false, &names);
@@ -71,7 +73,12 @@ struct SystemDevice::Impl {
                                                      .executor = pool,
                                                      .directory = directories.state / name / "transfers",
                                                      .temporary = directories.temporary})),
-          activities(makeActivityScheduler()),
+          deviceUse(makeSystemDeviceUse(runLoop)),
+          activities(makeActivityScheduler({.clock = *clock,
+                                            .executor = pool,
+                                            .files = *files,
+                                            .use = *deviceUse,
+                                            .file = directories.state / name / "activities.json"})),
           device{.clock = *clock,
                  .executor = pool,
                  .mainExecutor = runLoop,
@@ -120,6 +127,7 @@ struct SystemDevice::Impl {
     std::unique_ptr<UrlLoader> loader;
     std::unique_ptr<NetworkStatus> network;
     std::unique_ptr<BackgroundSessions> backgroundSessions;
+    std::unique_ptr<DeviceUseSource> deviceUse;
     std::unique_ptr<ActivityScheduler> activities;
     Device device;
 };

@@ -7,6 +7,7 @@
 
 #include "platform/ActivityScheduler.h"
 #include "platform/BackgroundSession.h"
+#include "platform/DeviceUse.h"
 #include "platform/Queue.h"
 #include "tests/support/MemoryFiles.h"
 
@@ -170,6 +171,22 @@ public:
     }
 
     std::map<std::string, std::pair<ActivityCriteria, Handler>> registered;
+};
+
+/// A use of the device that a test sets.
+struct FakeDeviceUse final : DeviceUseSource {
+    explicit FakeDeviceUse(Executor& executor_) : executor(executor_) {}
+    void ask(Answer answer) override
+    {
+        ++asked;
+        executor.execute(Priority::Default, [this, answer = std::move(answer)]() mutable { answer(found = now); });
+    }
+    [[nodiscard]] DeviceUse last() override { return found; }
+
+    Executor& executor;
+    DeviceUse now;
+    DeviceUse found;
+    int asked = 0;
 };
 
 } // namespace platform::test

@@ -1,0 +1,350 @@
+#include <gtest/gtest.h>
+
+#include <fmt/format.h>
+
+#include "platform/ActivityPolicy.h"
+#include "platform/ActivityScheduler.h"
+#include "tests/support/FakeBackground.h"
+#include "tests/support/ManualClock.h"
+#include "tests/support/ManualExecutor.h"
+#include "tests/support/MemoryFiles.h"
+#include "tests/support/TemporaryDirectory.h"
+#include "tests/support/TestDevice.h"
+
+namespace platform {
+namespace {
+
+using namespace std::chrono_literals;
+using enum ActivityState;
+
+// ---- decisions ----
+
+TEST(ActivityPolicy, CriteriaLookAtWhatTheyNameOnly)
+{
+    const DeviceUse busy{.onBattery = true, .screenInUse = true, .unlocked = false};
+    const struct {
+        ActivityCriteria criteria;
+        bool depend;
+    } cases[]{
+        {{}, false},
+        {{.allowBattery = false}, true},
+        {{.requireScreenSleep = true}, true},
+        {{.requireFirstUnlock = true}, true},
+        {{.repeating = true, .delay = 1s, .maintenance = true}, false},
+    };
+    for (const auto& c : cases) {
+        EXPECT_EQ(dependOnUse(c.criteria), c.depend);
+        EXPECT_EQ(criteriaHold(c.criteria, busy), !c.depend);
+        EXPECT_TRUE(criteriaHold(c.criteria, {}));
+    }
+}
+
+TEST(ActivityPolicy, WakesOnceForAllThatCanBeTogether)
+{
+    const struct {
+        std::vector<ActivityWindow> windows;
+        std::optional<Duration> wake;
+    } cases[]{
+        {{}, std::nullopt},
+        {{{100s, 300s}}, 100s},
+        {{{100s, 300s}, {250s, 0s}}, 250s},
+        {{{100s, 300s}, {400s, 0s}}, 400s},
+        {{{100s, 300s}, {401s, 0s}}, 100s},
+        {{{100s, 0s}, {50s, 20s}}, 50s},
+        {{{100s, 300s}, {200s, 50s}, {240s, 100s}, {260s, 0s}}, 240s},
+        {{{-5s, 0s}, {10s, 0s}}, -5s},
+    };
+    for (const auto& c : cases) EXPECT_EQ(wakeTime(c.windows), c.wake) << c.windows.size();
+}
+
+TEST(ActivityPolicy, TheFirstRunComesAfterTheDelayAndWhenAnEarlierProcessSaid)
+{
+    const ActivityCriteria repeating{.repeating = true, .delay = 300s, .interval = 600s};
+    const struct {
+        std::optional<Duration> kept;
+        Duration due;
+    } cases[]{{std::nullopt, 1300s}, {900s, 1300s}, {1400s, 1400s}, {1600s, 1600s}, {99999s, 1600s}, {-1s, 1300s}};
+    for (const auto& c : cases) EXPECT_EQ(firstDue(repeating, 1000s, c.kept), c.due);
+    EXPECT_EQ(firstDue({.delay = 1s, .interval = 600s}, 1000s, 1500s), 1001s) << "no interval is kept to";
+}
+
+TEST(DeviceUseTest, PowerSuppliesSayWhatTheDeviceRunsOn)
+{
+    const struct {
+        std::map<std::string, std::map<std::string, std::string>> supplies;
+        bool onBattery;
+    } cases[]{
+        {{}, false},
+        {{{"BAT0", {{"type", "Battery\n"}, {"present", "1\n"}}}}, true},
+        {{{"BAT0", {{"type", "Battery\n"}}}, {"AC", {{"type", "Mains\n"}, {"online", "0\n"}}}}, true},
+        {{{"BAT0", {{"type", "Battery\n"}}}, {"AC", {{"type", "Mains\n"}, {"online", "1\n"}}}}, false},
+        {{{"BAT0", {{"type", "Battery\n"}}}, {"usb", {{"type", "USB\n"}, {"online", "1\n"}}}}, false},
+        {{{"BAT0", {{"type", "Battery\n"}, {"present", "0\n"}}}}, false},
+        {{{"hidpp", {{"type", "Battery\n"}, {"scope", "Device\n"}}}}, false},
+        {{{"odd", {}}}, false},
+    };
+    for (const auto& c : cases) {
+        const test::TemporaryDirectory root;
+        for (const auto& [name, lines] : c.supplies) {
+            std::filesystem::create_directory(root / name);
+            for (const auto& [file, line] : lines) test::writeFile(root / name / file, line);
+        }
+        EXPECT_EQ(isOnBattery(root.path), c.onBattery);
+    }
+    EXPECT_FALSE(isOnBattery("/nowhere"));
+}
+
+// ---- the scheduler ----
+
+struct ActivitySchedulerTest : testing::Test {
+    ActivitySchedulerTest()
+    {
+        Log::threshold = LogLevel::Fault;
+        start();
+    }
+    ~ActivitySchedulerTest() override { kill(); }
+
+    void start()
+    {
+        scheduler = makeActivityScheduler(
+            {.clock = clock, .executor = executor, .files = files, .use = use, .file = "/state/activities.json"});
+    }
+    void kill()
+    {
+        held.clear();
+        scheduler.reset();
+        executor.drain();
+    }
+    void advance(Duration by)
+    {
+        clock.advance(by, [this] { executor.drain(); });
+    }
+    [[nodiscard]] std::int64_t seconds() const
+    {
+        return std::chrono::duration_cast<std::chrono::seconds>(Duration(clock.hostTicks() - began)).count();
+    }
+    /// Registers an activity whose runs are noted; `act` is what its handler does.
+    void add(const std::string& name, const ActivityCriteria& criteria,
+             std::function<void(const std::shared_ptr<Activity>&)> act = {})
+    {
+        scheduler->registerActivity(name, criteria, [this, act](const std::shared_ptr<Activity>& activity) {
+            if (activity->state() == ActivityState::Run)
+                runs.push_back(fmt::format("{} {}", activity->identifier(), seconds()));
+            if (act) act(activity);
+        });
+        advance(0s);
+    }
+    std::vector<std::string> taken() { return std::exchange(runs, {}); }
+
+    test::ManualClock clock;
+    test::ManualExecutor executor;
+    test::MemoryFiles files;
+    test::FakeDeviceUse use{executor};
+    std::unique_ptr<ActivityScheduler> scheduler;
+    const std::uint64_t began = clock.hostTicks();
+    std::vector<std::string> runs;
+    std::vector<std::shared_ptr<Activity>> held;
+    using Runs = std::vector<std::string>;
+    const ActivityCriteria flush{.repeating = true, .delay = 300s, .gracePeriod = 300s, .interval = 600s};
+};
+
+TEST_F(ActivitySchedulerTest, RunsAfterTheDelayAndThenAtTheInterval)
+{
+    add("a", flush);
+    add("once", {.delay = 100s});
+    advance(2000s);
+    EXPECT_EQ(taken(), (Runs{"once 100", "a 300", "a 900", "a 1500"}));
+    EXPECT_EQ(clock.pendingTimers(), 1u);
+    EXPECT_EQ(use.asked, 0) << "nothing is asked that isn't needed";
+    scheduler->unregister("a");
+    executor.drain();
+    EXPECT_EQ(clock.pendingTimers(), 0u);
+    advance(1h);
+    EXPECT_TRUE(taken().empty());
+}
+
+TEST_F(ActivitySchedulerTest, CompanyIsWaitedForWithinTheGrace)
+{
+    add("a", flush);
+    add("b", {.delay = 450s});
+    advance(1000s);
+    EXPECT_EQ(taken(), (Runs{"a 450", "b 450"}));
+}
+
+TEST_F(ActivitySchedulerTest, AProcessThatIsKilledOftenRunsActivitiesAndNoneMoreOften)
+{
+    for (const Duration life : {301s, 400s, 1000s, 5000s}) {
+        files.files.clear();
+        taken();
+        const auto from = clock.hostTicks();
+        while (clock.hostTicks() - from < 86'400'000'000'000u) {
+            start();
+            add("a", flush);
+            advance(life);
+            kill();
+            advance(10s); // until something starts it again
+        }
+        const auto count = taken().size();
+        EXPECT_LE(count, 24u * 6 + 1) << toSeconds(life);
+        EXPECT_GE(count, 24u * 4 - 1) << toSeconds(life);
+    }
+}
+
+TEST_F(ActivitySchedulerTest, ARunThatTheProcessDoesntSurviveIsNotRepeatedAtOnce)
+{
+    add("a", flush, [this](const auto& activity) {
+        if (activity->state() == ActivityState::Run) executor.execute(Priority::Default, [] {});
+        held.push_back(activity);
+        (void)activity->setState(Continue);
+    });
+    advance(300s);
+    EXPECT_EQ(taken().size(), 1u);
+    const auto disk = files.files;
+    kill();
+    files.files = disk; // as it was while the run was under way
+    start();
+    add("a", {.repeating = true, .interval = 600s});
+    advance(599s);
+    EXPECT_TRUE(taken().empty());
+    advance(2s);
+    EXPECT_EQ(taken().size(), 1u);
+}
+
+TEST_F(ActivitySchedulerTest, LeapsOfTheClockNeitherHoldBackNorHurry)
+{
+    for (const Duration leap : {24h * 365 * 30, -24h * 365 * 30, -2h}) {
+        add("a", flush);
+        advance(300s);
+        EXPECT_EQ(taken().size(), 1u);
+        clock.setWall(clock.wallNow() + leap);
+        advance(599s);
+        EXPECT_TRUE(taken().empty());
+        advance(1s);
+        EXPECT_EQ(taken().size(), 1u);
+        kill();
+        clock.setWall(clock.wallNow() + leap);
+        start();
+        add("a", {.repeating = true, .interval = 600s});
+        advance(599s);
+        EXPECT_TRUE(taken().empty()) << toSeconds(leap);
+        advance(1s);
+        EXPECT_EQ(taken().size(), 1u) << toSeconds(leap);
+        scheduler->unregister("a");
+    }
+    kill();
+    clock.setWall(clock.wallNow() + 24h); // a day without the process, or suspended
+    start();
+    add("a", {.repeating = true, .interval = 600s});
+    EXPECT_EQ(taken().size(), 1u);
+}
+
+TEST_F(ActivitySchedulerTest, StatesMoveOnOnly)
+{
+    const struct {
+        std::vector<std::pair<ActivityState, bool>> moves; ///< and whether each is accepted
+        Duration again;
+    } cases[]{
+        {{}, 600s},
+        {{{Done, true}, {Done, false}, {Continue, false}}, 600s},
+        {{{Wait, false},
+          {ActivityState::Run, false},
+          {CheckIn, false},
+          {Continue, true},
+          {Continue, false},
+          {Done, true}},
+         600s},
+        {{{Defer, true}, {Done, false}}, 300s},
+        {{{Continue, true}, {Defer, true}, {Done, false}}, 300s},
+        {{{Continue, true}}, 600s}, // and let go of
+    };
+    for (const auto& c : cases) {
+        int calls = 0;
+        add("a", {.repeating = true, .interval = 600s}, [&](const auto& activity) {
+            if (activity->state() == CheckIn) {
+                EXPECT_FALSE(activity->setState(ActivityState::Run) || activity->setState(Done));
+                return;
+            }
+            if (++calls > 1) return;
+            for (const auto& [state, accepted] : c.moves)
+                EXPECT_EQ(activity->setState(state), accepted) << static_cast<int>(state);
+        });
+        EXPECT_EQ(calls, 1);
+        advance(c.again - 1s);
+        EXPECT_EQ(calls, 1);
+        advance(1s);
+        EXPECT_EQ(calls, 2);
+        scheduler->unregister("a");
+        executor.drain();
+    }
+}
+
+TEST_F(ActivitySchedulerTest, ALongRunIsNotRepeatedBesideItself)
+{
+    add("a", {.repeating = true, .interval = 600s}, [this](const auto& activity) {
+        if (activity->setState(Continue)) held.push_back(activity);
+    });
+    advance(1h);
+    EXPECT_EQ(taken(), (Runs{"a 0"}));
+    EXPECT_TRUE(held.at(0)->setState(Done));
+    advance(1s);
+    EXPECT_EQ(taken(), (Runs{"a 3600"}));
+}
+
+TEST_F(ActivitySchedulerTest, CriteriaFromTheCheckInAreWaitedFor)
+{
+    add("a", {}, [](const auto& activity) {
+        activity->setCriteria({.repeating = true, .interval = 12h, .maintenance = true, .requireScreenSleep = true});
+    });
+    advance(1s);
+    use.now.screenInUse = true;
+    advance(12h);
+    EXPECT_EQ(taken(), (Runs{"a 0"}));
+    use.now.screenInUse = false;
+    advance(5min);
+    EXPECT_EQ(taken().size(), 1u);
+}
+
+TEST_F(ActivitySchedulerTest, ARunHearsThatItHadBetterStop)
+{
+    add("a", {.allowBattery = false}, [this](const auto& activity) {
+        if (activity->setState(Continue)) held.push_back(activity);
+    });
+    ASSERT_EQ(held.size(), 1u);
+    EXPECT_FALSE(held[0]->shouldDefer());
+    use.now.onBattery = true;
+    (void)held[0]->shouldDefer();
+    executor.drain();
+    EXPECT_TRUE(held[0]->shouldDefer());
+}
+
+TEST_F(ActivitySchedulerTest, ANewRegistrationTakesTheOldOnesPlace)
+{
+    add("a", flush, [this](const auto& activity) {
+        if (activity->setState(Continue)) held.push_back(activity);
+    });
+    advance(300s);
+    add("a", {.repeating = true, .delay = 10s, .interval = 600s});
+    EXPECT_TRUE(held.at(0)->setState(Done)) << "ends on its own";
+    advance(700s);
+    EXPECT_EQ(taken(), (Runs{"a 300", "a 900"})) << "what was due stays so";
+}
+
+TEST_F(ActivitySchedulerTest, WithoutAUsableFileActivitiesRunByTimer)
+{
+    for (const char* contents : {"", "{", "[]", "{\"lived\":\"x\"}", "{\"lived\":1,\"wall\":2,\"due\":{\"a\":\"x\"}}",
+                                 "{\"lived\":9223372036854775807,\"wall\":-9223372036854775808,"
+                                 "\"due\":{\"a\":9223372036854775807}}"}) {
+        kill();
+        files.files["/state/activities.json"] = contents;
+        start();
+        add("a", flush);
+        advance(600s);
+        EXPECT_EQ(taken().size(), 1u) << contents;
+    }
+    files.fault = [](std::string_view operation, const auto&) { return operation == "write" ? ENOSPC : 0; };
+    advance(1200s);
+    EXPECT_EQ(taken().size(), 2u) << "a full disk loses the due times only";
+}
+
+} // namespace
+} // namespace platform
