@@ -4,9 +4,8 @@
 int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
 {
     const auto record = platform::unarchive(textOf(data, size), tavrin::tavrindRecordClasses());
-    if (record)
-        fuzz::checkRoundTrips(**record);
-    else
-        fuzz::checkRefusal(record.error());
+    if (!record) return fuzz::checkRefusal(record.error()), 0;
+    fuzz::checkRoundTrips(**record);
+    fuzz::checkUpload(*record);
     return 0;
 }

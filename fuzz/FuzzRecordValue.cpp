@@ -8,9 +8,8 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
     const auto value = platform::parseJson(textOf(data, size));
     if (!value) return 0;
     const auto record = platform::recordFromValue(fuzz::enriched(*value), tavrin::tavrindRecordClasses());
-    if (record)
-        fuzz::checkRoundTrips(**record);
-    else
-        fuzz::checkRefusal(record.error());
+    if (!record) return fuzz::checkRefusal(record.error()), 0;
+    fuzz::checkRoundTrips(**record);
+    fuzz::checkUpload(*record);
     return 0;
 }

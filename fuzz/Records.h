@@ -2,6 +2,7 @@
 
 #include "fuzz/Check.h"
 #include "platform/Record.h"
+#include "tavrind/SessionProcessingHelper.h"
 #include "tavrind/TavrinFeedback.h"
 
 namespace fuzz {
@@ -17,6 +18,21 @@ inline void checkRoundTrips(const platform::Record& record)
         check(again.has_value(), again ? "" : again.error().description());
         check(platform::archive(**again) == bytes, std::string(record.className()));
     }
+}
+
+/// Checks that a record of an event can be uploaded, and is not changed by that.
+inline void checkUpload(const std::shared_ptr<platform::Record>& record)
+{
+    auto event = std::dynamic_pointer_cast<tavrin::TavrinFeedback>(record);
+    if (auto feedback = std::dynamic_pointer_cast<tavrin::ZRFeedback>(record))
+        event = std::make_shared<tavrin::TavrinFeedback>(std::move(feedback), 1, "", "");
+    if (!event) return;
+    const std::string stored = platform::archive(*event);
+    tavrin::SessionProcessingHelper helper;
+    const platform::Dictionary uploaded = event->processed(helper)->dictionary();
+    check(uploaded.contains("type") && uploaded.contains("timestamp"), "event without its keys");
+    check(!platform::toJson(uploaded).empty() && !event->description().empty(), "no JSON");
+    check(platform::archive(*event) == stored, "the stored record was changed");
 }
 
 /// Checks that a refusal says why.

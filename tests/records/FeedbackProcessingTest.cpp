@@ -1,6 +1,9 @@
+#include <regex>
+
 #include <gtest/gtest.h>
 
-#include "searchrecords/ZRSearchResult.h"
+#include "searchrecords/ZRResultFeedback.h"
+#include "tavrind/FeedbackProcessing.h"
 #include "tavrind/SessionProcessingHelper.h"
 #include "tavrind/TavrinSessionFeedback.h"
 #include "tests/records/FeedbackExamples.h"
@@ -9,47 +12,34 @@
 namespace tavrin {
 namespace {
 
-/// "r:ID" is a result and "s:ID" a suggestion. "r:-" has no identifier.
-std::string recordNamed(const std::string& name)
+/// The JSON of a record, with "<r:ID>" for a result and "<s:ID>" for a suggestion in it.
+std::string spelledOut(const std::string& text)
 {
-    const std::string id = name.substr(2);
-    return std::string(R"({"class":")") + (name[0] == 'r' ? "ZRSearchResult" : "TAVSearchSuggestion") + '"' +
-           (id == "-" ? "" : R"(,"identifier":")" + id + '"') + "}";
+    static const std::regex kResult("<r:(\\w*)>");
+    static const std::regex kSuggestion("<s:(\\w*)>");
+    const std::string some = std::regex_replace(text, kResult, R"({"class":"ZRSearchResult","identifier":"$1"})");
+    return std::regex_replace(some, kSuggestion, R"({"class":"TAVSearchSuggestion","identifier":"$1"})");
 }
 
-/// A record in JSON, with ⟨r:ID⟩ for what `recordNamed` makes.
-std::string spelledOut(std::string text)
+/// What stands under "id" in the JSON of an event, each with a blank behind it.
+std::string idsIn(const TavrinFeedback& event)
 {
-    for (std::size_t at; (at = text.find('<')) != std::string::npos;) {
-        const std::size_t end = text.find('>', at);
-        text.replace(at, end - at + 1, recordNamed(text.substr(at + 1, end - at - 1)));
-    }
-    return text;
-}
-
-/// Adds what stands under "id" in a value to `ids`, level by level from the left.
-void collectIds(const Value& value, std::vector<std::string>& ids)
-{
-    if (const Value::Array* array = value.asArray())
-        for (const Value& element : *array) collectIds(element, ids);
-    if (const Dictionary* dictionary = value.asDictionary())
-        for (const auto& [key, entry] : *dictionary) {
-            if (key == "id") ids.push_back(entry.asString() ? *entry.asString() : "null");
-            collectIds(entry, ids);
-        }
-}
-
-template <class T> std::vector<std::string> idsOf(const std::vector<std::shared_ptr<T>>& records)
-{
-    std::vector<std::string> ids;
-    for (const auto& record : records) ids.push_back(record->identifier.value_or("null"));
+    static const std::regex kId("\"id\":\"?(\\w+)");
+    const std::string json = platform::toJson(event.dictionary());
+    std::string ids;
+    for (std::sregex_iterator match(json.begin(), json.end(), kId), end; match != end; ++match)
+        ids += (*match)[1].str() + ' ';
     return ids;
 }
 
-using Ids = std::vector<std::string>;
+template <class Missing, class T> std::string idsIn(const std::vector<std::shared_ptr<T>>& missing)
+{
+    return idsIn(TavrinFeedback(std::make_shared<Missing>(missing), 0, "", ""));
+}
 
 constexpr const char* kVisible = R"({"class":"ZRVisibleResultsFeedback","results":[<r:a>,<r:b>,<r:a>]})";
 constexpr const char* kEngagedA = R"({"class":"ZRResultEngagementFeedback","result":<r:a>})";
+constexpr const char* kEngaged2 = R"({"class":"ZRResultEngagementFeedback","result":<r:2>})";
 constexpr const char* kLateA = R"({"class":"ZRResultsReceivedAfterTimeoutFeedback","results":[<r:a>]})";
 constexpr const char* kSectionA =
     R"({"class":"ZRLateSectionsAppendedFeedback","sections":[{"class":"ZRResultSection","identifier":"kept","results":[<r:a>]}]})";
@@ -65,82 +55,61 @@ TEST(SessionProcessing, IdentifiersBecomeNumbersAndWhatNoEventShowedIsMissing)
     struct {
         const char* what;
         std::vector<const char*> records;
-        Ids ids; ///< in the JSON of the events
-        Ids missingResults;
-        Ids missingSuggestions;
+        std::string ids; ///< in the JSON of the events
+        std::string missingResults;
+        std::string missingSuggestions;
     } const cases[] = {
-        {"visible results are only referred to", {kVisible}, {"1", "2", "1"}, {"1", "2"}, {}},
-        {"engaged, never shown, and engaged again", {kEngagedA, kEngagedA}, {"1", "1"}, {"1"}, {}},
-        {"engaged, then shown", {kEngagedA, kLateA}, {"1", "1"}, {}, {}},
-        {"shown, then engaged", {kLateA, kEngagedA}, {"1", "1"}, {}, {}},
-        {"shown in a section, whose identifier stays", {kEngagedA, kSectionA}, {"1", "kept", "1"}, {}, {}},
-        {"a ranking shows its section, then hidden, duplicate and ranked results",
-         {kRanked, kVisible},
-         {"2", "3", "4", "1", "4"},
-         {},
-         {}},
-        {"a suggestion chosen, never shown", {kChosenA}, {"1"}, {}, {"1"}},
-        {"a suggestion chosen, then shown", {kChosenA, kSuggestedA}, {"1", "1"}, {}, {}},
-        {"a suggestion shown, then chosen", {kSuggestedA, kChosenA}, {"1", "1"}, {}, {}},
-        {"a result and a suggestion of one identifier: showing it takes the result first",
-         {kEngagedA, kChosenA, kSuggestedA},
-         {"1", "1", "1"},
-         {},
-         {"1"}},
-        {"the first identifier of a session may look like a replacement",
-         {R"({"class":"ZRResultEngagementFeedback","result":<r:2>})", kEngagedA},
-         {"1", "2"},
-         {"1", "2"},
-         {}},
-        {"no identifier", {R"({"class":"ZRResultEngagementFeedback","result":<r:->})"}, {"null"}, {}, {}},
-        {"an empty identifier is one", {R"({"class":"ZRResultEngagementFeedback","result":<r:>})"}, {"1"}, {"1"}, {}},
-        {"nothing to engage, nothing in it",
-         {R"({"class":"ZRResultEngagementFeedback"})", R"({"class":"ZRRankingFeedback"})",
+        {"visible results are only referred to", {kVisible}, "1 2 1 ", "1 2 ", ""},
+        {"engaged, never shown, and engaged again", {kEngagedA, kEngagedA}, "1 1 ", "1 ", ""},
+        {"engaged, then shown", {kEngagedA, kLateA}, "1 1 ", "", ""},
+        {"shown, then engaged", {kLateA, kEngagedA}, "1 1 ", "", ""},
+        {"shown in a section, whose identifier stays", {kEngagedA, kSectionA}, "1 kept 1 ", "", ""},
+        {"a ranking shows its section, hidden, duplicate, ranked", {kRanked, kVisible}, "2 3 4 1 4 ", "", ""},
+        {"a suggestion chosen, never shown", {kChosenA}, "1 ", "", "1 "},
+        {"a suggestion chosen, then shown", {kChosenA, kSuggestedA}, "1 1 ", "", ""},
+        {"a suggestion shown, then chosen", {kSuggestedA, kChosenA}, "1 1 ", "", ""},
+        {"one identifier for both: the result is found first", {kEngagedA, kChosenA, kSuggestedA}, "1 1 1 ", "", "1 "},
+        {"an identifier like a replacement", {kEngaged2, kEngagedA}, "1 2 ", "1 2 ", ""},
+        {"an empty identifier is one", {R"({"class":"ZRResultEngagementFeedback","result":<r:>})"}, "1 ", "1 ", ""},
+        {"no identifier",
+         {R"({"class":"ZRResultEngagementFeedback","result":{"class":"ZRSearchResult"}})",
+          R"({"class":"ZRResultEngagementFeedback"})", R"({"class":"ZRRankingFeedback"})",
           R"({"class":"ZRVisibleResultsFeedback"})", R"({"class":"ZRSuggestionEngagementFeedback"})"},
-         {"null"},
-         {},
-         {}},
+         "null null ",
+         "",
+         ""},
         {"other records keep what they hold",
          {R"({"class":"ZRCustomFeedback","jsonFeedback":{"id":"mine"}})",
           R"({"class":"TavrinSessionMissingResults","results":[<r:7>]})"},
-         {"mine", "7"},
-         {},
-         {}},
+         "mine 7 ",
+         "",
+         ""},
     };
     for (const auto& c : cases) {
         SCOPED_TRACE(c.what);
         SessionProcessingHelper helper;
-        Ids ids;
-        for (const char* record : c.records) {
-            const TavrinFeedback event(feedbackFrom(spelledOut(record)), 1, "", "");
-            collectIds(event.processed(helper)->dictionary(), ids);
-        }
+        std::string ids;
+        for (const char* record : c.records)
+            ids += idsIn(*TavrinFeedback(feedbackFrom(spelledOut(record)), 1, "", "").processed(helper));
         EXPECT_EQ(ids, c.ids);
-        EXPECT_EQ(idsOf(helper.missingResults()), c.missingResults);
-        EXPECT_EQ(idsOf(helper.missingSuggestions()), c.missingSuggestions);
+        EXPECT_EQ(idsIn<TavrinSessionMissingResults>(helper.missingResults()), c.missingResults);
+        EXPECT_EQ(idsIn<TavrinSessionMissingSuggestions>(helper.missingSuggestions()), c.missingSuggestions);
     }
 }
 
-TEST(SessionProcessing, MissingResultsAreWholeAsFirstReferredToAndInOrder)
+TEST(SessionProcessing, MissingResultsAreThoseFirstReferredToInOrder)
 {
     SessionProcessingHelper helper;
-    for (int i = 1; i <= 12; ++i) {
-        for (const char* title : {"first", "later"}) {
-            const std::string id = "private " + std::to_string(i);
-            const TavrinFeedback event(
-                feedbackFrom(
-                    R"({"class":"ZRResultEngagementFeedback","result":{"class":"ZRSearchResult","identifier":")" + id +
-                    R"(","correctedQuery":")" + title + R"("}})"),
-                1, "", "");
-            (void)event.processed(helper);
-        }
+    for (int i = 0; i < 24; ++i) {
+        ZRResultEngagementFeedback record;
+        record.result = std::make_shared<ZRSearchResult>();
+        record.result->identifier = "private " + std::to_string(i % 12);
+        record.result->rankingScore = i;
+        (void)processedFeedback(std::make_shared<ZRResultEngagementFeedback>(record), helper);
     }
     const auto missing = helper.missingResults();
     ASSERT_EQ(missing.size(), 12u);
-    for (std::size_t i = 0; i < missing.size(); ++i) {
-        EXPECT_EQ(missing[i]->identifier, std::to_string(i + 1));
-        EXPECT_EQ(missing[i]->correctedQuery, "first");
-    }
+    for (std::size_t i = 0; i < missing.size(); ++i) EXPECT_EQ(missing[i]->rankingScore, static_cast<double>(i));
 }
 
 /// A record of a class in its IPC form, filled to the given depth; results and suggestions are called "private N".
