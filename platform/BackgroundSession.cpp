@@ -267,6 +267,7 @@ private:
     std::optional<Error> _storeError; // where there can't be one
     LivedTime _time;
     std::map<std::uint64_t, Entry> _entries;
+    std::vector<std::uint64_t> _leftOver; ///< are over, and could not be removed from the store yet
     std::uint64_t _bodyBytes = 0;
     std::map<std::string, Duration> _holds;
 
@@ -418,8 +419,13 @@ void Session::_drop(std::uint64_t identifier)
     const auto found = _entries.find(identifier);
     _bodyBytes -= found->second.stored.bodySize;
     _entries.erase(found);
-    if (auto forgotten = _store->forget(identifier); !forgotten)
-        defaultLog().error("background task {} can't be removed: {}", identifier, forgotten.error().description());
+    _leftOver.push_back(identifier);
+    std::erase_if(_leftOver, [this](std::uint64_t left) {
+        const auto forgotten = _store->forget(left);
+        if (!forgotten)
+            defaultLog().error("background task {} can't be removed: {}", left, forgotten.error().description());
+        return forgotten.has_value();
+    });
 }
 
 // ---- what tasks wait for ----

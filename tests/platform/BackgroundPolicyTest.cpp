@@ -1,8 +1,11 @@
 #include <gtest/gtest.h>
 
+#include <cerrno>
+
 #include "platform/BackgroundPolicy.h"
 #include "platform/LivedTime.h"
 #include "platform/NetworkStatus.h"
+#include "platform/UrlSession.h"
 #include "tests/support/ManualClock.h"
 
 namespace platform {
@@ -22,6 +25,21 @@ TEST(BackgroundPolicy, DelaysGrowToAnHour)
         EXPECT_EQ(retryDelay(c.failures, 1), c.longest) << c.failures;
         EXPECT_EQ(retryDelay(c.failures, 0.5), (c.shortest + c.longest) / 2) << c.failures;
     }
+}
+
+TEST(BackgroundPolicy, OnlyWhatMayGetBetterIsTriedAgain)
+{
+    const auto better = [](std::string_view domain, std::int64_t code) {
+        return mayGetBetter(Error(std::string(domain), code));
+    };
+    for (const auto code : {kUrlTimedOut, kUrlConnectionLost, kUrlTlsFailed, kUrlBadResponse, kUrlCannotConnect,
+                            kUrlCannotFindHost, kUrlNotConnected})
+        EXPECT_TRUE(better(kUrlErrorDomain, code)) << code;
+    for (const auto code :
+         {kUrlBadUrl, kUrlForbiddenRedirect, kUrlTooLarge, kUrlTooManyRedirects, kUrlUnsupported, kUrlCancelled})
+        EXPECT_FALSE(better(kUrlErrorDomain, code)) << code;
+    EXPECT_TRUE(better(kPosixErrorDomain, ENOSPC));
+    EXPECT_FALSE(better(kPosixErrorDomain, EIO) || better("other", 1));
 }
 
 TEST(BackgroundPolicy, RetryAfterIsSecondsOrADate)

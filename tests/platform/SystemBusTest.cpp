@@ -1,0 +1,156 @@
+#include <gtest/gtest.h>
+
+#include <csignal>
+#include <cstdlib>
+#include <spawn.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <systemd/sd-bus.h>
+
+#include "platform/DeviceUse.h"
+#include "platform/NetworkStatus.h"
+#include "platform/RunLoop.h"
+#include "tests/support/TemporaryDirectory.h"
+#include "tests/support/TestDevice.h"
+
+namespace platform {
+namespace {
+
+/// A message bus of the test's own, in the system bus's place, and services on it whose properties the test sets.
+struct SystemBusTest : testing::Test {
+    SystemBusTest()
+    {
+        Log::threshold = LogLevel::Fault;
+        test::writeFile(directory / "bus.conf",
+                        "<busconfig><type>session</type><listen>unix:path=" + (directory / "bus").string() +
+                            "</listen><policy context=\"default\"><allow send_destination=\"*\"/><allow own=\"*\"/>"
+                            "<allow user=\"*\"/><allow receive_sender=\"*\"/></policy></busconfig>");
+        int ready[2];
+        EXPECT_EQ(pipe(ready), 0);
+        const std::string configuration = "--config-file=" + (directory / "bus.conf").string();
+        const std::string print = "--print-address=" + std::to_string(ready[1]);
+        const char* const arguments[]{"dbus-daemon", "--nofork", configuration.c_str(), print.c_str(), nullptr};
+        EXPECT_EQ(posix_spawnp(&daemon, arguments[0], nullptr, nullptr, const_cast<char* const*>(arguments), environ),
+                  0);
+        close(ready[1]);
+        char byte = 0;
+        EXPECT_EQ(read(ready[0], &byte, 1), 1) << "dbus-daemon doesn't start";
+        close(ready[0]);
+        useBus("unix:path=" + (directory / "bus").string());
+    }
+    ~SystemBusTest() override
+    {
+        sd_bus_flush_close_unref(service);
+        if (daemon > 0) {
+            kill(daemon, SIGTERM);
+            waitpid(daemon, nullptr, 0);
+        }
+        unsetenv("DBUS_SYSTEM_BUS_ADDRESS");
+    }
+    static void useBus(const std::string& address) { setenv("DBUS_SYSTEM_BUS_ADDRESS", address.c_str(), 1); }
+
+    void serve(const char* name)
+    {
+        ASSERT_GE(sd_bus_open_system(&service), 0);
+        sd_bus_attach_event(service, loop.handle(), SD_EVENT_PRIORITY_NORMAL);
+        ASSERT_GE(sd_bus_request_name(service, name, 0), 0);
+    }
+
+    test::TemporaryDirectory directory;
+    pid_t daemon = 0;
+    RunLoop loop;
+    sd_bus* service = nullptr;
+};
+
+struct Network {
+    std::uint32_t state = 70;
+    std::uint32_t metered = 2;
+};
+const sd_bus_vtable kNetwork[]{
+    SD_BUS_VTABLE_START(0),
+    SD_BUS_PROPERTY("State", "u", nullptr, offsetof(Network, state), SD_BUS_VTABLE_PROPERTY_EMITS_CHANGE),
+    SD_BUS_PROPERTY("Metered", "u", nullptr, offsetof(Network, metered), SD_BUS_VTABLE_PROPERTY_EMITS_CHANGE),
+    SD_BUS_VTABLE_END,
+};
+
+TEST_F(SystemBusTest, NetworkManagerIsFollowedAndMayGo)
+{
+    constexpr const char* kName = "org.freedesktop.NetworkManager";
+    constexpr const char* kPath = "/org/freedesktop/NetworkManager";
+    Network network{.metered = 1};
+    serve(kName);
+    sd_bus_add_object_vtable(service, nullptr, kPath, kName, kNetwork, &network);
+    const auto status = makeNetworkManagerStatus(loop);
+    EXPECT_EQ(status->current(), std::nullopt);
+    const auto becomes = [&](const NetworkState& state) {
+        return test::runUntil(loop, [&] { return status->current() == state; });
+    };
+    EXPECT_TRUE(becomes({.online = true, .metered = true}));
+    network = {.state = 20, .metered = 0};
+    sd_bus_emit_properties_changed(service, kPath, kName, "State", "Metered", nullptr);
+    EXPECT_TRUE(becomes({.online = false}));
+    sd_bus_release_name(service, kName);
+    EXPECT_TRUE(becomes({})) << "without it, the network is taken as there";
+    sd_bus_request_name(service, kName, 0);
+    EXPECT_TRUE(becomes({.online = false})) << "back again";
+}
+
+TEST_F(SystemBusTest, WithoutABusOrServiceTheDeviceIsOnlineAndNobodyUsesIt)
+{
+    for (const std::string& address :
+         {"unix:path=" + (directory / "bus").string(), std::string("unix:path=/nowhere")}) {
+        useBus(address);
+        const auto status = makeNetworkManagerStatus(loop);
+        (void)status->current();
+        EXPECT_TRUE(test::runUntil(loop, [&] { return status->current() == NetworkState(); })) << address;
+        const auto use = makeSystemDeviceUse(loop, directory.path);
+        std::optional<DeviceUse> answer;
+        use->ask([&](const DeviceUse& found) { answer = found; });
+        EXPECT_EQ(answer, std::nullopt) << "never inside the call";
+        EXPECT_TRUE(test::runUntil(loop, [&] { return answer.has_value(); })) << address;
+        EXPECT_EQ(answer, DeviceUse()) << address;
+    }
+}
+
+struct Session {
+    int active = 1, idle = 0, locked = 0;
+};
+const sd_bus_vtable kSession[]{
+    SD_BUS_VTABLE_START(0),
+    SD_BUS_PROPERTY("Active", "b", nullptr, offsetof(Session, active), 0),
+    SD_BUS_PROPERTY("IdleHint", "b", nullptr, offsetof(Session, idle), 0),
+    SD_BUS_PROPERTY("LockedHint", "b", nullptr, offsetof(Session, locked), 0),
+    SD_BUS_VTABLE_END,
+};
+
+TEST_F(SystemBusTest, LogindSaysWhetherSomeoneIsAtTheScreen)
+{
+    serve("org.freedesktop.login1");
+    const auto use = makeSystemDeviceUse(loop, directory.path);
+    const auto ask = [&] {
+        std::optional<DeviceUse> answer;
+        use->ask([&](const DeviceUse& found) { answer = found; });
+        EXPECT_TRUE(test::runUntil(loop, [&] { return answer.has_value(); }));
+        EXPECT_EQ(use->last(), answer);
+        return answer.value_or(DeviceUse());
+    };
+    EXPECT_EQ(ask(), (DeviceUse{.unlocked = false})) << "nobody has logged in yet";
+    Session session;
+    sd_bus_slot* slot = nullptr;
+    sd_bus_add_object_vtable(service, &slot, "/org/freedesktop/login1/session/auto", "org.freedesktop.login1.Session",
+                             kSession, &session);
+    const struct {
+        Session session;
+        bool inUse;
+    } cases[]{{{1, 0, 0}, true}, {{0, 0, 0}, false}, {{1, 1, 0}, false}, {{1, 0, 1}, false}};
+    for (const auto& c : cases) {
+        session = c.session;
+        EXPECT_EQ(ask(), (DeviceUse{.screenInUse = c.inUse}));
+    }
+    sd_bus_slot_unref(slot);
+    EXPECT_EQ(ask(), DeviceUse()) << "logged out, but has been there";
+}
+
+} // namespace
+} // namespace platform
