@@ -237,8 +237,11 @@ ipc::Handler daemonHandler(std::weak_ptr<TAVDaemonXPC> object, std::weak_ptr<TAV
         } else if (member == "ReportEvent") {
             auto feedback = record<ZRFeedback>(arguments.args[2], "feedback", reply);
             if (!feedback && feedback.error() == Refusal::Malformed) return;
-            if (feedback.value_or(nullptr)) daemon->reportEvent(text(arguments, 0), *arguments.args[1].asInt(), std::move(*feedback));
-            reply(message({}));
+            if (!feedback.value_or(nullptr)) return reply(message({}));
+            // Answered when its last holder lets the event go: a client can't have more of them under way than calls.
+            std::shared_ptr<void> call(nullptr, [answer = std::make_shared<ipc::Responder>(std::move(reply))](
+                                                    std::nullptr_t) { (*answer)(message({})); });
+            daemon->reportEvent(text(arguments, 0), *arguments.args[1].asInt(), std::move(*feedback), std::move(call));
         } else if (member == "Feedback") {
             daemon->feedback(text(arguments, 0),
                              replyThrough<Value::Array, OptionalError>(

@@ -36,7 +36,9 @@ public:
                            platform::Reply<std::string> reply) = 0;
     virtual void bag(BagReply reply) = 0;
     virtual void request(std::shared_ptr<TAVRequest> request, RequestReply reply) = 0;
-    virtual void reportEvent(const std::string& event, std::int64_t queryId, std::shared_ptr<ZRFeedback> feedback) = 0;
+    /// `call` is answered when the last copy of it goes: hold it until the event has been dealt with.
+    virtual void reportEvent(const std::string& event, std::int64_t queryId, std::shared_ptr<ZRFeedback> feedback,
+                             std::shared_ptr<void> call) = 0;
     /// The current session's feedback, as the dictionaries that are uploaded, with relative times.
     virtual void feedback(const std::string& argument,
                           platform::Reply<platform::Value::Array, OptionalError> reply) = 0;

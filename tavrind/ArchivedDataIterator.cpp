@@ -15,7 +15,7 @@ std::uint64_t ArchivedDataIterator::_length() const
 
 std::optional<std::string_view> ArchivedDataIterator::readNextObject()
 {
-    const platform::Log& log = TavrinLogForCategory(kLogFeedback);
+    const platform::Log& log = TavrinLogForCategory(kLogFeedbackStorage);
     const auto failed = [&log](const char* text) {
         log.error("{}", text);
         return std::nullopt;
@@ -28,15 +28,6 @@ std::optional<std::string_view> ArchivedDataIterator::readNextObject()
     const auto archive = _data.view().substr(_position + kLengthSize, length);
     _position += kLengthSize + length;
     return archive;
-}
-
-bool ArchivedDataIterator::skipObject()
-{
-    if (_position + kLengthSize >= _data.size()) return false;
-    const std::uint64_t length = _length();
-    if (length == 0 || length > _data.size() - _position - kLengthSize) return false;
-    _position += kLengthSize + length;
-    return true;
 }
 
 } // namespace tavrin

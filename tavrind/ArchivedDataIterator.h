@@ -18,8 +18,6 @@ public:
     [[nodiscard]] bool hasMore() const { return _position + kLengthSize <= _data.size(); }
     /// The next record's archive; none at the end or at a broken record, and the position stays.
     [[nodiscard]] std::optional<std::string_view> readNextObject();
-    /// Moves past the next record without a look at it; false where there is none. Logs nothing.
-    bool skipObject();
 
     /// Where the next record's length begins.
     [[nodiscard]] std::uint64_t position() const { return _position; }

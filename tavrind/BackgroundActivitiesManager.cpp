@@ -4,9 +4,9 @@
 #include "platform/Queue.h"
 #include "platform/Transactions.h"
 #include "tavrind/Assembly.h"
-#include "tavrind/ClientSession.h"
 #include "tavrind/FeedbackBooks.h"
 #include "tavrind/FileContainer.h"
+#include "tavrind/StoredSession.h"
 #include "tavrind/TavrinFeedbackFlusher.h"
 #include "tavrind/TavrinFlusherXPC.h"
 #include "tavrind/TavrinLogging.h"
@@ -58,7 +58,8 @@ std::shared_ptr<BackgroundActivitiesManager> BackgroundActivitiesManager::make(A
 
 BackgroundActivitiesManager::BackgroundActivitiesManager(Assembly& assembly)
     : _assembly(assembly),
-      _queueFlusher(assembly.device.serialQueue("com.quorvane.tavrind.backgrondActivitiesManagerQueue")),
+      _queueFlusher(assembly.device.serialQueue("com.quorvane.tavrind.backgrondActivitiesManagerQueue",
+                                                 platform::Priority::Background)),
       _feedbackFlusher(TavrinFeedbackFlusher::make(assembly, 1))
 {}
 
@@ -161,7 +162,7 @@ void BackgroundActivitiesManager::taskDidComplete(const std::shared_ptr<platform
     }
     _assembly.feedbackBooks.move(FeedbackFate::Uploading, sent ? FeedbackFate::Sent : FeedbackFate::NotSent,
                                  UploadNote::from(task->note()).events);
-    _assembly.feedbackBooks.save();
+    _assembly.feedbackBooks.saveSoon();
 }
 
 void BackgroundActivitiesManager::sessionDidFinishEvents()

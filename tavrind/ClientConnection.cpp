@@ -263,13 +263,15 @@ void ClientConnection::_reportOneOff(const platform::Error& error) const
     ClientSession::createFeedbackSessionFromError(error, _assembly)->sessionComplete();
 }
 
-void ClientConnection::reportEvent(const std::string&, std::int64_t queryId, std::shared_ptr<ZRFeedback> feedback)
+void ClientConnection::reportEvent(const std::string&, std::int64_t queryId, std::shared_ptr<ZRFeedback> feedback,
+                                   std::shared_ptr<void> call)
 {
     if (feedback->timestamp == 0) feedback->timestamp = _assembly.device.clock.hostTicks();
-    reportEvent(std::move(feedback), queryId);
+    reportEvent(std::move(feedback), queryId, std::move(call));
 }
 
-void ClientConnection::reportEvent(std::shared_ptr<ZRFeedback> feedback, std::int64_t queryId)
+void ClientConnection::reportEvent(std::shared_ptr<ZRFeedback> feedback, std::int64_t queryId,
+                                   std::shared_ptr<void> call)
 {
     const platform::Log& log = TavrinLogForCategory(kLogFeedback);
     if (!_state) {
@@ -301,8 +303,9 @@ void ClientConnection::reportEvent(std::shared_ptr<ZRFeedback> feedback, std::in
         if (engagement->result->type == ResultType::Tavrin)
             _assembly.diagnosticData.addValue(1, createCounterKey(*shortName, "tavrin.engagements"));
     }
-    manager->addTavrinFeedback(
-        std::make_shared<TavrinFeedback>(std::move(feedback), queryId, "", userAgent(), clientQueryId));
+    auto event = std::make_shared<TavrinFeedback>(std::move(feedback), queryId, "", userAgent(), clientQueryId);
+    event->call = std::move(call);
+    manager->addTavrinFeedback(std::move(event));
 }
 
 void ClientConnection::handleCustomFeedback(std::shared_ptr<ZRCustomFeedback> feedback, std::int64_t queryId,

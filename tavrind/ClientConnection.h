@@ -37,7 +37,8 @@ public:
     void configure(std::shared_ptr<TAVSessionConfiguration> configuration, platform::Reply<std::string> reply) override;
     void bag(BagReply reply) override;
     void request(std::shared_ptr<TAVRequest> request, RequestReply reply) override;
-    void reportEvent(const std::string& event, std::int64_t queryId, std::shared_ptr<ZRFeedback> feedback) override;
+    void reportEvent(const std::string& event, std::int64_t queryId, std::shared_ptr<ZRFeedback> feedback,
+                     std::shared_ptr<void> call) override;
     void feedback(const std::string& argument, platform::Reply<platform::Value::Array, OptionalError> reply) override;
     void listenToFlusher(platform::Reply<std::string> reply) override;
     void listSessions(platform::Reply<platform::Value::Array> reply) override;
@@ -60,7 +61,7 @@ private:
     [[nodiscard]] std::shared_ptr<ClientState> _boundState() const;
     void _completeDefaults(TAVRequest& request) const;
     void search(std::shared_ptr<TAVSearchRequest> request, RequestReply reply);
-    void reportEvent(std::shared_ptr<ZRFeedback> feedback, std::int64_t queryId);
+    void reportEvent(std::shared_ptr<ZRFeedback> feedback, std::int64_t queryId, std::shared_ptr<void> call);
     void handleCustomFeedback(std::shared_ptr<ZRCustomFeedback> feedback, std::int64_t queryId,
                               std::move_only_function<void()> callback);
     void _reportOneOff(const platform::Error& error) const;

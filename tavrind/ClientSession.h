@@ -9,7 +9,6 @@
 
 #include "platform/Value.h"
 #include "tavrind/ClientSessionHeader.h"
-#include "tavrind/FeedbacksToSend.h"
 
 namespace platform {
 class Queue;
@@ -22,7 +21,6 @@ struct Assembly;
 struct TavrinFeedback;
 class ClientSession;
 class FileContainer;
-class SessionProcessingHelper;
 
 /// What a session manager keeps: one session, or one for each user agent. Any thread.
 class Session {
@@ -35,23 +33,18 @@ public:
     [[nodiscard]] virtual std::vector<std::shared_ptr<TavrinFeedback>> getSessionFeedbacks() = 0;
     /// The same as dictionaries, with milliseconds since the first.
     [[nodiscard]] virtual platform::Value::Array feedbacksWithRelativeTimestamp() = 0;
-    /// The same as they are uploaded: identifiers replaced, missing results and suggestions last.
-    [[nodiscard]] virtual platform::Value::Array privacyFilteredFeedbacksWithRelativeTimestamp() = 0;
     /// Calls back with each session of a user agent; `last` with the last one.
     virtual void enumerateSessions(const std::function<void(ClientSession& session, bool last)>& callback) = 0;
 };
 
 /// One session of one user agent: what the user saw and did, written to a file of its own as it comes, until the session
 /// is complete.
-///
-/// A session that is read back from its file has its feedback in memory, and no file to write to. Any thread.
-class ClientSession final : public Session, public Flushable {
+/// (`StoredSession` is what its file gives.) Any thread.
+class ClientSession final : public Session {
 public:
     /// A new session that begins with `feedback`, which gives it its agent and GUID. Makes its file.
     ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback> feedback,
                   std::int64_t previousSessionEndReason = 0);
-    /// A session as its file has it.
-    ClientSession(ClientSessionHeader header, std::vector<std::shared_ptr<TavrinFeedback>> feedbacks);
     ~ClientSession() override;
 
     void addFeedback(std::shared_ptr<TavrinFeedback> feedback) override;
@@ -60,15 +53,10 @@ public:
     [[nodiscard]] const platform::Uuid& userGuid() const override { return _header.userGuid; }
     std::vector<std::shared_ptr<TavrinFeedback>> getSessionFeedbacks() override;
     platform::Value::Array feedbacksWithRelativeTimestamp() override;
-    platform::Value::Array privacyFilteredFeedbacksWithRelativeTimestamp() override;
     void enumerateSessions(const std::function<void(ClientSession& session, bool last)>& callback) override
     {
         callback(*this, true);
     }
-
-    /// The upload; entries behind the first missing one are left out. Takes the feedback out of memory.
-    [[nodiscard]] FeedbacksToSend getFeedbacksToSend() override;
-    [[nodiscard]] std::size_t recordedEvents() const override { return _recordedEvents; }
 
     [[nodiscard]] const ClientSessionHeader& header() const { return _header; }
     [[nodiscard]] const std::string& agent() const { return _header.agent; }
@@ -82,12 +70,11 @@ private:
     [[nodiscard]] bool _firstUseOfTheDay();
     [[nodiscard]] bool _updateFirstUseDate();
 
-    Assembly* _assembly = nullptr; // null for a session that was read
+    Assembly& _assembly;
     ClientSessionHeader _header;
     std::shared_ptr<FileContainer> _storageHandle;
-    std::size_t _recordedEvents = 0; // of a session that was read
-    std::shared_ptr<platform::Queue> _sessionQueue; // null for a session that was read; guards the feedback
-    /// Shared with the writes under way. Of a new session only where the assembly's testFeedbacks asks for it.
+    std::shared_ptr<platform::Queue> _sessionQueue;
+    /// On the queue; shared with the writes under way. Filled only where the assembly's testFeedbacks asks for it.
     std::shared_ptr<std::vector<std::shared_ptr<TavrinFeedback>>> _sessionFeedbacks;
 };
 

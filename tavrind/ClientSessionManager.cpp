@@ -96,7 +96,7 @@ void ClientSessionManager::addTavrinFeedback(std::shared_ptr<TavrinFeedback> fee
 
 bool ClientSessionManager::_wantsFeedback(const TavrinFeedback& feedback) const
 {
-    const auto bag = _assembly.bagController ? _assembly.bagController->currentBag() : nullptr;
+    const auto bag = _assembly.bagController ? _assembly.bagController->inMemoryBag() : nullptr;
     return !bag || TAVBag(bag->rawBag(), feedback.userAgent).feedbackEnabled();
 }
 
@@ -131,7 +131,6 @@ void ClientSessionManager::_updateState(std::shared_ptr<TavrinFeedback> feedback
         if (transition.next) _currentState = *transition.next;
         return;
     }
-    log().debug("External event received {}", static_cast<unsigned>(event));
 }
 
 void ClientSessionManager::_nothing(Occasion&) {}

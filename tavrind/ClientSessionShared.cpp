@@ -54,11 +54,6 @@ platform::Value::Array ClientSessionShared::feedbacksWithRelativeTimestamp()
     return _joined(&ClientSession::feedbacksWithRelativeTimestamp);
 }
 
-platform::Value::Array ClientSessionShared::privacyFilteredFeedbacksWithRelativeTimestamp()
-{
-    return _joined(&ClientSession::privacyFilteredFeedbacksWithRelativeTimestamp);
-}
-
 void ClientSessionShared::enumerateSessions(const std::function<void(ClientSession& session, bool last)>& callback)
 {
     _sessionQueue->sync([&] {

@@ -22,7 +22,6 @@ public:
     /// Those of one user agent behind those of another; the same holds below.
     std::vector<std::shared_ptr<TavrinFeedback>> getSessionFeedbacks() override;
     platform::Value::Array feedbacksWithRelativeTimestamp() override;
-    platform::Value::Array privacyFilteredFeedbacksWithRelativeTimestamp() override;
     void enumerateSessions(const std::function<void(ClientSession& session, bool last)>& callback) override;
 
 private:

@@ -7,6 +7,7 @@
 
 #include "platform/Error.h"
 #include "platform/Files.h"
+#include "platform/Queue.h"
 #include "platform/Uuid.h"
 #include "tavrind/TavrinLogging.h"
 
@@ -24,6 +25,7 @@ constexpr std::array<std::string_view, kFeedbackFates> kNames{
     "open",           "closed",        "uploading",    "sent",         "notSent",   "unknown",
     "feedbackOff",    "noContainer",   "refusedAppend", "fileTooBig",  "tooOld",    "unreadable",
     "otherVersion",   "damagedTail",   "notJson",      "noBody",       "noTask",    "endpointUnset",
+    "bufferFull",
 };
 constexpr auto kFirstDropped = static_cast<std::size_t>(FeedbackFate::FeedbackOff);
 
@@ -34,8 +36,9 @@ constexpr std::size_t at(FeedbackFate fate)
 
 } // namespace
 
-FeedbackBooks::FeedbackBooks(platform::FileSystem& files, std::filesystem::path path)
-    : _files(files), _path(std::move(path)), _process(platform::Uuid::random().string())
+FeedbackBooks::FeedbackBooks(platform::FileSystem& files, std::filesystem::path path,
+                             std::shared_ptr<platform::Queue> queue)
+    : _files(files), _path(std::move(path)), _process(platform::Uuid::random().string()), _queue(std::move(queue))
 {
     _load();
 }
@@ -95,6 +98,21 @@ void FeedbackBooks::save()
     auto written = _files.createDirectories(_path.parent_path());
     if (written) written = _files.writeAtomically(_path, text);
     if (!written) TavrinLogForCategory(kLogFeedback).error("feedback books not saved: {}", written.error().reason());
+}
+
+void FeedbackBooks::saveSoon()
+{
+    {
+        const std::lock_guard lock(_mutex);
+        if (std::exchange(_saveQueued, true)) return;
+    }
+    _queue->async([this] {
+        {
+            const std::lock_guard lock(_mutex);
+            _saveQueued = false;
+        }
+        save();
+    });
 }
 
 std::int64_t FeedbackBooks::recorded() const

@@ -3,6 +3,7 @@
 #include <array>
 #include <cstdint>
 #include <filesystem>
+#include <memory>
 #include <mutex>
 #include <string>
 
@@ -10,7 +11,8 @@
 
 namespace platform {
 class FileSystem;
-}
+class Queue;
+} // namespace platform
 
 namespace tavrin {
 
@@ -35,8 +37,9 @@ enum class FeedbackFate : std::uint8_t {
     NoBody,        ///< the upload's body could not be written
     NoTask,        ///< the upload could not be made
     EndpointUnset, ///< there was nowhere to send it to
+    BufferFull,    ///< too many waited to be sent already
 };
-inline constexpr std::size_t kFeedbackFates = static_cast<std::size_t>(FeedbackFate::EndpointUnset) + 1;
+inline constexpr std::size_t kFeedbackFates = static_cast<std::size_t>(FeedbackFate::BufferFull) + 1;
 
 /// The books of the feedback pipeline, in events: every event that was recorded is in exactly one place, so that
 /// `recorded` is at all times the sum over all fates.
@@ -44,11 +47,13 @@ inline constexpr std::size_t kFeedbackFates = static_cast<std::size_t>(FeedbackF
 /// They outlive the process. They are saved where events change hands between files (a session is closed, read,
 /// uploaded), not with every event. A new process takes all that was under way for unknown, and moves to their places
 /// the events that it finds again in session files and unfinished uploads; what it finds beyond the books, written after
-/// they were last saved, it books as recorded. Any thread.
+/// they were last saved, it books as recorded. It can't tell one event from another: one that was written since then
+/// takes the place of one that is gone, and an upload that is reported again after a kill is booked again. Any thread.
 class FeedbackBooks {
 public:
     /// Reads `path`; a damaged file is logged, and the books begin anew.
-    FeedbackBooks(platform::FileSystem& files, std::filesystem::path path);
+    /// `queue` (serial) runs the saving.
+    FeedbackBooks(platform::FileSystem& files, std::filesystem::path path, std::shared_ptr<platform::Queue> queue);
 
     /// An event was recorded, and is at, or dropped for, `fate`.
     void record(FeedbackFate fate, std::uint64_t events = 1);
@@ -58,6 +63,8 @@ public:
     void find(FeedbackFate fate, std::uint64_t events);
     /// Writes them out; a failure is logged, and the books go on in memory.
     void save();
+    /// The same, soon, and once for calls that come close together.
+    void saveSoon();
 
     /// Names this process's part of the books, unlike that of any other.
     [[nodiscard]] const std::string& process() const { return _process; }
@@ -78,7 +85,9 @@ private:
     std::int64_t _recorded = 0;
     std::array<std::int64_t, kFeedbackFates> _counts{};
     std::int64_t _unresolved = 0; ///< of the unknown ones, those that may still be found
-    std::mutex _saving;           // keeps an older state from overwriting a newer one
+    bool _saveQueued = false;
+    std::shared_ptr<platform::Queue> _queue;
+    std::mutex _saving; // keeps an older state from overwriting a newer one
 };
 
 } // namespace tavrin

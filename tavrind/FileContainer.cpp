@@ -1,17 +1,19 @@
 #include "tavrind/FileContainer.h"
 
+#include <algorithm>
 #include <array>
 #include <bit>
 #include <exception>
+#include <unistd.h>
 
 #include "platform/Files.h"
 #include "platform/Queue.h"
 #include "platform/Transactions.h"
 #include "tavrind/ArchivedDataIterator.h"
-#include "tavrind/ClientSession.h"
 #include "tavrind/ClientSessionHeader.h"
 #include "tavrind/FeedbackBooks.h"
 #include "tavrind/mmap_file.h"
+#include "tavrind/StoredSession.h"
 #include "tavrind/TavrinDiagnosticDataReporter.h"
 #include "tavrind/TavrinFeedback.h"
 #include "tavrind/TavrinLogging.h"
@@ -67,11 +69,11 @@ void FileContainer::writeSessionHeader(ClientSessionHeader header)
     _store->queue->async([self = shared_from_this(), header = std::move(header)] {
         if (!self->_archiveObject(platform::archiveValue(self->_store->version))) {
             log().error("Could not write version string");
-            self->_closeFile();
+            self->closeFile();
         }
         if (!self->_archiveObject(platform::archive(header))) {
             log().error("Could not write root object");
-            self->_closeFile();
+            self->closeFile();
         }
     });
 }
@@ -111,36 +113,37 @@ bool FileContainer::_archiveObject(const std::string& archive)
 void FileContainer::close()
 {
     _store->queue->async([self = shared_from_this()] {
-        if (self->_fileHandle) self->_closeFile();
+        self->closeFile();
         self->_store->books.move(FeedbackFate::Open, FeedbackFate::Closed, self->_feedbackCount);
     });
 }
 
-void FileContainer::_closeFile()
+void FileContainer::closeFile()
 {
     _store->queue->assertOnQueue();
+    if (!_fileHandle) return;
     log().debug("close file url {}", _fileUrl.string());
     _fileHandle.reset();
 }
 
-std::shared_ptr<ClientSession> FileContainer::read()
+std::shared_ptr<StoredSession> FileContainer::read()
 {
     return _store->queue->sync([this] { return _read(); });
 }
 
-std::shared_ptr<ClientSession> FileContainer::_notRead(FeedbackFate fate, const std::string& text)
+std::shared_ptr<StoredSession> FileContainer::_notRead(FeedbackFate fate, const std::string& text)
 {
     log().error("{}", text);
     _store->books.move(FeedbackFate::Closed, fate, std::exchange(_feedbackCount, 0));
     return nullptr;
 }
 
-std::shared_ptr<ClientSession> FileContainer::_read()
+std::shared_ptr<StoredSession> FileContainer::_read()
 {
     log().debug("reading file url {}", _fileUrl.string());
     if (_fileHandle) {
         log().error("file is already open closing it {}", _fileUrl.string());
-        _closeFile();
+        closeFile();
     }
     if (_fileUrl.empty()) return _notRead(FeedbackFate::Unreadable, "No file url available");
     const auto attributes = _store->files.info(_fileUrl);
@@ -163,7 +166,7 @@ std::shared_ptr<ClientSession> FileContainer::_read()
     }
 }
 
-std::shared_ptr<ClientSession> FileContainer::_unarchiveObject(const Bytes& data)
+std::shared_ptr<StoredSession> FileContainer::_unarchiveObject(const Bytes& data)
 {
     _store->queue->assertOnQueue();
     if (data.size() > UINT32_MAX) return _notRead(FeedbackFate::Unreadable, "erroneous file data length");
@@ -189,18 +192,25 @@ std::shared_ptr<ClientSession> FileContainer::_unarchiveObject(const Bytes& data
         feedbacks.push_back(std::move(feedback));
     }
     if (feedbacks.size() < _feedbackCount)
-        _store->books.move(FeedbackFate::Closed, FeedbackFate::DamagedTail, _feedbackCount - feedbacks.size());
-    return std::make_shared<ClientSession>(*header, std::move(feedbacks));
+        _store->books.move(FeedbackFate::Closed, FeedbackFate::DamagedTail,
+                           std::exchange(_feedbackCount, feedbacks.size()) - feedbacks.size());
+    return std::make_shared<StoredSession>(*header, std::move(feedbacks));
 }
 
-std::uint64_t FileContainer::countFeedback(platform::FileSystem& files, const std::filesystem::path& fileUrl)
+std::uint64_t FileContainer::countFeedback(const FileContainerStore& store, const std::filesystem::path& fileUrl)
 {
-    const auto file = files.openForReading(fileUrl);
-    const auto data = file ? mmapFileHandle(*file) : std::unexpected(file.error());
-    if (!data) return 0;
-    ArchivedDataIterator records(*data);
+    const auto file = store.files.openForReading(fileUrl);
+    const auto attributes = store.files.info(fileUrl);
+    if (!file || !attributes) return 0;
+    const std::uint64_t end = std::min(attributes->size, store.maxFileSize);
+    std::uint64_t position = 0;
     std::uint64_t count = 0;
-    while (records.skipObject()) ++count;
+    std::uint64_t length = 0;
+    while (pread(file->fd(), &length, sizeof(length), static_cast<off_t>(position)) == sizeof(length) && length > 0 &&
+           position + sizeof(length) < end && length <= end - position - sizeof(length)) {
+        position += sizeof(length) + length;
+        ++count;
+    }
     return count > 2 ? count - 2 : 0; // the version and the header
 }
 

@@ -20,8 +20,8 @@ namespace tavrin {
 
 struct ClientSessionHeader;
 struct TavrinFeedback;
-class ClientSession;
 class FeedbackBooks;
+class StoredSession;
 class TavrinDiagnosticDataReporter;
 enum class FeedbackFate : std::uint8_t;
 
@@ -59,22 +59,25 @@ public:
     /// fit. A file that isn't open takes nothing and calls nobody.
     void writeFeedback(std::shared_ptr<const TavrinFeedback> feedback, std::move_only_function<void()> done);
     /// The session with all its events that can be read; null if nothing can. Waits for the queue.
-    [[nodiscard]] std::shared_ptr<ClientSession> read();
+    [[nodiscard]] std::shared_ptr<StoredSession> read();
     /// Closes the file, soon; its events are then booked as closed.
     void close();
 
     [[nodiscard]] const std::filesystem::path& fileUrl() const { return _fileUrl; }
 
-    /// Events in a session file, however damaged. Reads the lengths alone.
-    [[nodiscard]] static std::uint64_t countFeedback(platform::FileSystem& files, const std::filesystem::path& fileUrl);
+    /// Closes the file, if it is open. On the queue.
+    void closeFile();
+
+    /// Events in a session file, however damaged. Reads the lengths alone, up to the size that may be read.
+    [[nodiscard]] static std::uint64_t countFeedback(const FileContainerStore& store,
+                                                     const std::filesystem::path& fileUrl);
 
 private:
     bool _archiveObject(const std::string& archive);
-    void _closeFile();
-    [[nodiscard]] std::shared_ptr<ClientSession> _read();
-    [[nodiscard]] std::shared_ptr<ClientSession> _unarchiveObject(const platform::Bytes& data);
+    [[nodiscard]] std::shared_ptr<StoredSession> _read();
+    [[nodiscard]] std::shared_ptr<StoredSession> _unarchiveObject(const platform::Bytes& data);
     /// Logs why nothing was read, and books the file's events.
-    [[nodiscard]] std::shared_ptr<ClientSession> _notRead(FeedbackFate fate, const std::string& text);
+    [[nodiscard]] std::shared_ptr<StoredSession> _notRead(FeedbackFate fate, const std::string& text);
 
     const std::shared_ptr<const FileContainerStore> _store;
     const std::filesystem::path _fileUrl;

@@ -90,7 +90,11 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device)
     daemon->service = TavrinService::make(assembly);
 
     auto listener = device.ipc.listen(daemonInterface(), "com.quorvane.tavrind.connection");
-    if (!listener) return std::unexpected(std::move(listener.error()));
+    if (!listener) {
+        // Tasks that are under way refer to the services: the process ends with them whole.
+        (void)daemon.release();
+        return std::unexpected(std::move(listener.error()));
+    }
     daemon->listener = std::move(*listener);
     daemon->listener->setAcceptor([service = daemon->service](std::shared_ptr<platform::ipc::Connection> connection) {
         service->listenerShouldAcceptNewConnection(std::move(connection));

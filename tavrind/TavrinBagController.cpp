@@ -223,8 +223,7 @@ Value TavrinBagController::diskCachedBagDictionary()
         log().log("Unexpected class deserialized from bag cache: {}.", platform::typeName(bag->type()));
         return {};
     }
-    if (_isRefreshRequiredForCachedBag(*bag)) _fetchBagStateWithVersion({});
-    return std::move(*bag);
+    return std::move(*bag); // stale or not: the reading that ends the start-up fetches a stale one
 }
 
 Value TavrinBagController::_dictionaryToCacheBag(const Value& fetched)

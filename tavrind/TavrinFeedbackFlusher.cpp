@@ -28,6 +28,10 @@ constexpr platform::Duration kUploadTimeout = 300s;
 constexpr std::size_t kMaximumPath = 1024;
 constexpr int kMaximumNameAttempts = 16;
 
+// Records that go out on their own wait in memory for the next pass, ten minutes or longer.
+constexpr std::size_t kMaximumRecords = 1000;
+constexpr std::size_t kMaximumRecordBytes = 8u << 20; // of JSON text
+
 const platform::Log& log()
 {
     return TavrinLogForCategory(kLogFlusher);
@@ -113,7 +117,7 @@ std::shared_ptr<TavrinFeedbackFlusher> TavrinFeedbackFlusher::make(Assembly& ass
 
 TavrinFeedbackFlusher::TavrinFeedbackFlusher(Assembly& assembly, std::int64_t identifier)
     : _assembly(assembly), _identifier(identifier),
-      _queueBuffer(assembly.device.serialQueue("com.quorvane.tavrind.tavrinDataBufferQueue")),
+      _queueBuffer(assembly.device.serialQueue("com.quorvane.tavrind.tavrinDataBufferQueue", platform::Priority::Background)),
       _feedbackCountQueue(assembly.device.serialQueue("com.quorvane.tavrind.feedbackCountQueue"))
 {
     log().log("Initialize flusher for {}", convertIdentifierToString(identifier));
@@ -132,9 +136,22 @@ void TavrinFeedbackFlusher::flush(std::shared_ptr<Flushable> object, std::move_o
 
 void TavrinFeedbackFlusher::flush(std::shared_ptr<ZRCustomFeedback> record, std::move_only_function<void()> callback)
 {
-    _assembly.feedbackBooks.record(FeedbackFate::Open);
-    flush(std::static_pointer_cast<Flushable>(std::make_shared<CustomFeedbackToSend>(std::move(record))),
-          std::move(callback));
+    _queueBuffer->async([self = shared_from_this(), record = std::move(record),
+                         callback = std::move(callback)]() mutable {
+        const std::size_t size = platform::jsonSize(record->jsonFeedback);
+        const bool full =
+            self->_recordsBuffered == kMaximumRecords || size > kMaximumRecordBytes - self->_recordBytesBuffered;
+        if (full) {
+            log().error("{} records of {} bytes wait already, dropping one of {} bytes", self->_recordsBuffered,
+                        self->_recordBytesBuffered, size);
+        } else {
+            ++self->_recordsBuffered;
+            self->_recordBytesBuffered += size;
+            self->_sessionBuffer.push_back(std::make_shared<CustomFeedbackToSend>(std::move(record)));
+        }
+        self->_assembly.feedbackBooks.record(full ? FeedbackFate::BufferFull : FeedbackFate::Open);
+        if (callback) callback();
+    });
 }
 
 void TavrinFeedbackFlusher::flushSyncFromArray(std::vector<std::shared_ptr<Flushable>> objects)
@@ -150,6 +167,7 @@ void TavrinFeedbackFlusher::dropFeedbacks()
         for (const auto& object : self->_sessionBuffer)
             self->_assembly.feedbackBooks.move(FeedbackFate::Open, FeedbackFate::NotSent, object->recordedEvents());
         self->_sessionBuffer.clear();
+        self->_recordsBuffered = self->_recordBytesBuffered = 0;
     });
 }
 
@@ -173,9 +191,10 @@ TavrinFeedbackFlusher::Bodies TavrinFeedbackFlusher::flushToWireWithObjectsRetur
 {
     _queueBuffer->assertOnQueue();
     log().info("Sessions Flushed {}", _sessionBuffer.size());
-    if (!_serverEndpoint && !_sessionBuffer.empty())
+    if (!_serverEndpoint)
         log().error("Server endpoint not set, data can't be sent to server");
     Bodies bodies;
+    _recordsBuffered = _recordBytesBuffered = 0;
     for (const auto& object : std::exchange(_sessionBuffer, {})) _flushObject(*object, returned ? &bodies : nullptr);
     return bodies;
 }

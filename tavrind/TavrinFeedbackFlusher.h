@@ -62,7 +62,7 @@ public:
 
     /// Takes an object for the next flush, soon, then calls back.
     void flush(std::shared_ptr<Flushable> object, std::move_only_function<void()> callback);
-    /// The same for a record that is sent on its own.
+    /// The same for a record that is sent on its own; dropped where too many wait.
     void flush(std::shared_ptr<ZRCustomFeedback> record, std::move_only_function<void()> callback);
     void flushSyncFromArray(std::vector<std::shared_ptr<Flushable>> objects);
     /// Forgets what was taken and not flushed.
@@ -99,6 +99,8 @@ private:
     const std::int64_t _identifier;
     std::shared_ptr<platform::Queue> _queueBuffer; // guards the buffer and the endpoint
     std::vector<std::shared_ptr<Flushable>> _sessionBuffer;
+    std::size_t _recordsBuffered = 0; ///< records in the buffer that go out on their own, and their bytes
+    std::size_t _recordBytesBuffered = 0;
     std::optional<platform::Url> _serverEndpoint;
     std::shared_ptr<platform::Queue> _feedbackCountQueue; // guards the counts
     std::map<std::uint64_t, std::int64_t> _feedbacksPerTask;

@@ -135,8 +135,8 @@ void TavrinFlusherXPC::initiateConnectionWithIntent(std::uint64_t intent, std::s
 
 void TavrinFlusherXPC::_dump(const Tool& tool)
 {
-    const auto done = whenReleased([&flusher = *_assembly.backgroundFlusher, tool] {
-        flusher.setStopFlushing(false);
+    const auto done = whenReleased([flusher = _assembly.backgroundFlusher, tool] {
+        flusher->setStopFlushing(false);
         tool->workDone();
     });
     if (!_getClientConnections) return;
@@ -148,20 +148,20 @@ void TavrinFlusherXPC::_dump(const Tool& tool)
     }
 }
 
-TavrinFlusherXPC::Tool TavrinFlusherXPC::_listener(const Tool& role) const
+TavrinFlusherXPC::Tool TavrinFlusherXPC::_holderOf(Tool TavrinFlusherXPC::*role) const
 {
     const std::lock_guard lock(_mutex);
-    return role;
+    return this->*role;
 }
 
 void TavrinFlusherXPC::sendDataToSendingStreamListener(const platform::Bytes& body)
 {
-    if (const Tool listener = _listener(_sendingStreamListener)) listener->flushedData(body);
+    if (const Tool listener = _holderOf(&TavrinFlusherXPC::_sendingStreamListener)) listener->flushedData(body);
 }
 
 void TavrinFlusherXPC::sendDataToReceivingStreamListener(const TavrinFeedback& feedback)
 {
-    const Tool listener = _listener(_receivingStreamListener);
+    const Tool listener = _holderOf(&TavrinFlusherXPC::_receivingStreamListener);
     const bool logged = platform::Log::enabled(platform::LogLevel::Debug);
     if (!listener && !logged) return;
     const std::string description = feedback.description();

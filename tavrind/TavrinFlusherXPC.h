@@ -42,7 +42,7 @@ private:
     void _accept(const std::shared_ptr<platform::ipc::Connection>& connection);
     void _removeDelegate(const Tool& tool);
     void _dump(const Tool& tool);
-    [[nodiscard]] Tool _listener(const Tool& role) const;
+    [[nodiscard]] Tool _holderOf(Tool TavrinFlusherXPC::*role) const;
 
     Assembly& _assembly;
     GetClientConnections _getClientConnections;

@@ -20,8 +20,10 @@ namespace fs = std::filesystem;
 namespace {
 
 constexpr std::string_view kPrefix = "session.";
-constexpr std::int64_t kDefaultMaxFileSize = 4u << 20;   // bytes
-constexpr std::int64_t kDefaultMaxFileAge = 48 * 60 * 60; // seconds
+constexpr double kDefaultMaxFileSize = 4u << 20;    // bytes
+constexpr double kDefaultMaxFileAge = 48 * 60 * 60; // seconds
+constexpr double kLargestLimit = 1e15;
+constexpr int kMaximumFiles = 2000; // open and waiting: each open one takes a descriptor
 constexpr int kMaximumNameAttempts = 16;
 
 const platform::Log& log()
@@ -29,10 +31,10 @@ const platform::Log& log()
     return TavrinLogForCategory(kLogFeedbackStorage);
 }
 
-std::int64_t limit(const platform::UserDefaults& userDefaults, std::string_view key, std::int64_t fallback)
+double limit(const platform::UserDefaults& userDefaults, std::string_view key, double fallback)
 {
-    const std::int64_t value = userDefaults.integer(key).value_or(0);
-    return value < 1 ? fallback : value;
+    const double value = userDefaults.value(key).asDouble().value_or(0);
+    return value >= 1 ? std::min(value, kLargestLimit) : fallback;
 }
 
 } // namespace
@@ -56,7 +58,7 @@ TavrinPersistentStorage::TavrinPersistentStorage(Assembly& assembly)
           assembly.fileManager, assembly.device.transactions, assembly.diagnosticData, assembly.feedbackBooks, _queue,
           ClientSessionManager::tavrindUserAgent(),
           static_cast<std::uint64_t>(limit(assembly.userDefaults, "TAVSessionSizeLimit", kDefaultMaxFileSize)))),
-      _maxFileAge(static_cast<double>(limit(assembly.userDefaults, "TAVSessionMaxAge", kDefaultMaxFileAge)))
+      _maxFileAge(limit(assembly.userDefaults, "TAVSessionMaxAge", kDefaultMaxFileAge))
 {
     _scanCacheDirectory();
 }
@@ -89,7 +91,7 @@ std::optional<std::int32_t> TavrinPersistentStorage::_adopt(const std::string& n
         log().error("{} is no file, and is left alone", fileUrl.string());
         return sessionNumber(name); // the name is taken all the same
     }
-    const std::uint64_t feedbackCount = FileContainer::countFeedback(_assembly.fileManager, fileUrl);
+    const std::uint64_t feedbackCount = FileContainer::countFeedback(*_store, fileUrl);
     if (platform::toSeconds(_assembly.device.clock.wallNow() - attributes->created) > _maxFileAge) {
         _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.filetooold");
         _assembly.feedbackBooks.find(FeedbackFate::TooOld, feedbackCount);
@@ -98,6 +100,7 @@ std::optional<std::int32_t> TavrinPersistentStorage::_adopt(const std::string& n
         return std::nullopt;
     }
     _assembly.feedbackBooks.find(FeedbackFate::Closed, feedbackCount);
+    ++_fileCount;
     _fileContainers.push_back(std::make_shared<FileContainer>(_store, fileUrl, feedbackCount));
     return sessionNumber(name);
 }
@@ -114,19 +117,24 @@ std::optional<fs::path> TavrinPersistentStorage::_newFileUrl()
 
 std::shared_ptr<FileContainer> TavrinPersistentStorage::createFileContainerForWriting()
 {
+    if (_fileCount >= kMaximumFiles) {
+        log().error("{} session files wait already: no other one", kMaximumFiles);
+        return nullptr;
+    }
     // Names that something else has taken since the scan are passed over.
     for (int attempt = 0; attempt < kMaximumNameAttempts; ++attempt) {
         const auto fileUrl = _newFileUrl();
-        if (!fileUrl) {
-            log().error("Could not get a file url");
-            return nullptr;
-        }
-        log().debug("new file url {}", fileUrl->string());
+        if (!fileUrl) break;
         auto file = _assembly.fileManager.createForAppending(*fileUrl);
-        if (file) return std::make_shared<FileContainer>(_store, *fileUrl, std::move(*file));
-        log().error("Could not open file for writing {}", file.error().description());
-        if (file.error().code != EEXIST) return nullptr;
+        if (file) {
+            log().debug("new file url {}", fileUrl->string());
+            ++_fileCount;
+            return std::make_shared<FileContainer>(_store, *fileUrl, std::move(*file));
+        }
+        log().error("{}", file.error().description());
+        if (file.error().code != EEXIST) break;
     }
+    log().error("Could not get a file url");
     return nullptr;
 }
 
@@ -143,14 +151,15 @@ void TavrinPersistentStorage::closeSessionWithFileContainer(std::shared_ptr<File
     container->close();
     _queue->async([self = shared_from_this(), container = std::move(container)]() mutable {
         self->_fileContainers.push_back(std::move(container));
-        self->_assembly.feedbackBooks.save();
+        self->_assembly.feedbackBooks.saveSoon();
     });
 }
 
 void TavrinPersistentStorage::deleteSessionWithFileContainer(std::shared_ptr<FileContainer> container)
 {
     _queue->async([self = shared_from_this(), container = std::move(container)] {
-        std::erase(self->_fileContainers, container);
+        self->_fileCount -= static_cast<int>(std::erase(self->_fileContainers, container));
+        container->closeFile();
         const fs::path& fileUrl = container->fileUrl();
         if (fileUrl.empty()) return log().error("Handle {} does not have a File URL", static_cast<const void*>(container.get()));
         log().debug("delete file url {}", fileUrl.string());

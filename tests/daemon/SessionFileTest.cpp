@@ -3,7 +3,8 @@
 
 #include "platform/Record.h"
 #include "tavrind/ArchivedDataIterator.h"
-#include "tavrind/ClientSession.h"
+#include "tavrind/ClientSessionHeader.h"
+#include "tavrind/StoredSession.h"
 #include "tests/support/Examples.h"
 #include "tests/support/FeedbackFixture.h"
 
@@ -54,17 +55,25 @@ struct SessionFileTest : FeedbackTest {
     {
         device.files.files[std::string(kDirectory) + "session.5"] = bytes;
         const std::filesystem::path path = std::string(kDirectory) + "session.5";
-        const std::uint64_t count = FileContainer::countFeedback(device.files, path);
+        const std::uint64_t count = FileContainer::countFeedback(storage()->store(), path);
         assembly().feedbackBooks.find(FeedbackFate::Closed, count);
         return std::make_shared<FileContainer>(
             std::shared_ptr<const FileContainerStore>(std::shared_ptr<void>(), &storage()->store()), path, count);
     }
-    static std::vector<std::string> inputsIn(ClientSession& session)
+    static std::vector<std::string> inputsIn(const StoredSession& session)
     {
         std::vector<std::string> inputs;
-        for (const auto& each : session.getSessionFeedbacks())
+        for (const auto& each : session.feedbacks())
             inputs.push_back(*std::dynamic_pointer_cast<ZRDidGoToSiteFeedback>(each->feedback)->input);
         return inputs;
+    }
+
+    static std::vector<std::size_t> recordEnds(const std::string& file)
+    {
+        std::vector<std::size_t> ends;
+        ArchivedDataIterator records{platform::Bytes(file)};
+        while (records.readNextObject()) ends.push_back(records.position());
+        return ends;
     }
 
     static constexpr const char* kGuid = "01234567-89AB-4DEF-8123-456789ABCDEF";
@@ -78,7 +87,7 @@ TEST_F(SessionFileTest, IsWhatTheFormatSays)
     const auto session = container->read();
     ASSERT_TRUE(session);
     EXPECT_EQ(platform::archive(session->header()), platform::archive(header()));
-    EXPECT_EQ(session->getSessionFeedbacks().at(0)->clientQueryId, 7u);
+    EXPECT_EQ(session->feedbacks().at(0)->clientQueryId, 7u);
 }
 
 TEST_F(SessionFileTest, CutAnywhereItGivesEveryWholeEventBeforeTheCut)
@@ -86,9 +95,7 @@ TEST_F(SessionFileTest, CutAnywhereItGivesEveryWholeEventBeforeTheCut)
     start();
     const std::vector<std::string> inputs{"a", "bb", "ccc", "dddd"};
     const std::string whole = contents(closedFile(inputs)->fileUrl().filename());
-    std::vector<std::size_t> ends; // of the records
-    ArchivedDataIterator records{platform::Bytes(whole)};
-    while (records.skipObject()) ends.push_back(records.position());
+    const auto ends = recordEnds(whole);
     ASSERT_EQ(ends.size(), 6u);
     for (std::size_t cut = 0; cut <= whole.size(); ++cut) {
         const auto session = adopted(whole.substr(0, cut))->read();
@@ -107,10 +114,7 @@ TEST_F(SessionFileTest, FlippedBitsLoseNothingBeforeThem)
     start();
     const std::vector<std::string> inputs{"a", "bb", "ccc", "dddd", "eeeee"};
     const std::string whole = contents(closedFile(inputs)->fileUrl().filename());
-    std::vector<std::size_t> ends;
-    ArchivedDataIterator records{platform::Bytes(whole)};
-    while (records.skipObject()) ends.push_back(records.position());
-
+    const auto ends = recordEnds(whole);
     std::mt19937 random(20261125);
     for (int i = 0; i < 10'000; ++i) {
         std::string damaged = whole;
@@ -124,7 +128,7 @@ TEST_F(SessionFileTest, FlippedBitsLoseNothingBeforeThem)
         const auto intact = std::ranges::count_if(ends, [first](std::size_t end) { return end <= first; });
         if (intact < 2) continue;
         ASSERT_TRUE(session) << i;
-        const auto all = session->getSessionFeedbacks();
+        const auto& all = session->feedbacks();
         ASSERT_GE(static_cast<long>(all.size()), intact - 2) << i;
     }
     expectBooksClose();

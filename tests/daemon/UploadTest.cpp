@@ -111,6 +111,57 @@ TEST_F(UploadTest, CrowdsourcingRecordsGoOutOnTheirOwn)
     expectBooksClose();
 }
 
+TEST_F(UploadTest, WhatWaitsInMemoryIsBounded)
+{
+    begin();
+    const Dictionary record{{"feedbackType", 2}, {"jsonFeedback", Dictionary{{"text", std::string(20'000, 'x')}}}};
+    for (int i = 0; i < 500; ++i) report("ZRCustomFeedback", record);
+    EXPECT_EQ(booked(FeedbackFate::BufferFull), 500 - 8 * 1024 * 1024 / 20'011);
+    auto& flusher = *assembly().crowdsourcingFeedbackFlusher;
+    EXPECT_EQ(flusher.countOfDatabuffer(), 500u - static_cast<std::size_t>(booked(FeedbackFate::BufferFull)));
+    flusher.dropFeedbacks();
+    device.drain();
+    for (int i = 0; i < 1100; ++i) report("ZRCustomFeedback", {{"feedbackType", 2}, {"jsonFeedback", Dictionary()}});
+    EXPECT_EQ(flusher.sessionBuffer().size(), 1000u);
+    std::size_t bodies = 0;
+    const std::int64_t before = counter("clientconnection");
+    flusher.flushAllToWire([&bodies](const TavrinFeedbackFlusher::Bodies& flushed) { bodies = flushed.size(); });
+    device.drain();
+    EXPECT_EQ(bodies, 1000u);
+    EXPECT_EQ(counter("clientconnection") - before, 1000) << "the counter of connections counts these, too";
+    expectBooksClose();
+}
+
+TEST_F(UploadTest, SessionFilesAreBounded)
+{
+    begin();
+    const Dictionary record{{"feedbackType", 3}, {"jsonFeedback", Dictionary()}}; // a session of its own
+    for (int i = 0; i < 2001; ++i) report("ZRCustomFeedback", record);
+    EXPECT_EQ(sessionFiles().size(), 2000u);
+    EXPECT_EQ(booked(FeedbackFate::NoContainer), 1);
+    upload();
+    report("ZRCustomFeedback", record);
+    EXPECT_EQ(sessionFiles().size(), 1u) << "there is room again";
+    expectBooksClose();
+}
+
+TEST_F(UploadTest, AReportIsAnsweredWhenItIsWritten)
+{
+    begin();
+    bool written = false;
+    device.files.fault = [&written](std::string_view operation, const auto&) {
+        written = written || operation == "append";
+        return 0;
+    };
+    const auto call =
+        connection->call("ReportEvent", {"event", std::int64_t{1}, Dictionary{{"class", "ZRClearInputFeedback"}}});
+    connection->queue()->sync([] {}); // the call has been taken
+    EXPECT_FALSE(written || call->answered());
+    device.drain();
+    EXPECT_TRUE(written && call->answered());
+    device.files.fault = {};
+}
+
 TEST_F(UploadTest, TheBagDecidesOnTheEndpoint)
 {
     begin();
@@ -127,7 +178,7 @@ TEST_F(UploadTest, TheBagDecidesOnTheEndpoint)
     upload();
     EXPECT_TRUE(uploads().empty());
     EXPECT_TRUE(sessionFiles().empty()) << "dropped all the same";
-    EXPECT_EQ(log.count("Server endpoint not set"), static_cast<int>(files));
+    EXPECT_EQ(log.count("Server endpoint not set"), static_cast<int>(files) + 1) << "and of crowdsourcing";
     EXPECT_GE(booked(FeedbackFate::EndpointUnset), 2);
     EXPECT_EQ(booked(FeedbackFate::Closed), 0);
     expectBooksClose();

@@ -60,7 +60,8 @@ struct EchoDaemon final : TAVDaemonXPC, TAVDiagnosticsXPC, TAVEndpointXPC {
         echoed->rawResponse = platform::Bytes(std::string(request->className()) + ":" + request->queryString);
         reply(request->queryId, std::move(echoed), std::nullopt);
     }
-    void reportEvent(const std::string& event, std::int64_t queryId, std::shared_ptr<ZRFeedback> feedback) override
+    void reportEvent(const std::string& event, std::int64_t queryId, std::shared_ptr<ZRFeedback> feedback,
+                     std::shared_ptr<void>) override
     {
         std::lock_guard lock(mutex);
         events.push_back(event + " " + std::to_string(queryId) + " " + std::string(feedback->className()));
