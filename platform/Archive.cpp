@@ -19,17 +19,39 @@ constexpr std::int64_t kNanosecondsPerSecond = 1'000'000'000;
 
 class ArchiveEncoder final : public Encoder {
 public:
-    void beginRecord(std::string_view className, std::size_t fieldCount) override
+    void beginRecord(std::string_view className, std::size_t) override
     {
-        _packer.pack_map(static_cast<std::uint32_t>(fieldCount + 1));
+        // A map with a count of 16 bits, which is known when the record ends.
+        _records.push_back({.start = _stream.bytes.size(), .entries = 1});
+        _stream.bytes.append("\xde\0\0", 3);
         packText(kClassKey);
         packText(className);
     }
-    void key(std::string_view name) override { packText(name); }
-    void endRecord() override {}
+    void key(std::string_view name) override
+    {
+        _keyStart = _stream.bytes.size();
+        packText(name);
+        _keyEnd = _stream.bytes.size();
+        ++_records.back().entries;
+    }
+    void endRecord() override
+    {
+        store(_stream.bytes.data() + _records.back().start + 1, _records.back().entries);
+        _records.pop_back();
+    }
     void beginArray(std::size_t count) override { _packer.pack_array(static_cast<std::uint32_t>(count)); }
     void endArray() override {}
-    void null() override { _packer.pack_nil(); }
+    /// A field that is null is left out: its key goes again.
+    void null() override
+    {
+        if (_stream.bytes.size() != _keyEnd) {
+            _packer.pack_nil();
+            return;
+        }
+        _stream.bytes.resize(_keyStart);
+        _keyEnd = std::string::npos;
+        --_records.back().entries;
+    }
     void boolean(bool value) override { value ? _packer.pack_true() : _packer.pack_false(); }
     void integer(std::int64_t value) override { _packer.pack_int64(value); }
     void unsignedInteger(std::uint64_t value) override { _packer.pack_uint64(value); }
@@ -38,7 +60,7 @@ public:
         // The packer would write a whole number as an integer, and the value would come back as another type.
         std::array<char, 9> number{'\xcb'};
         store(number.data() + 1, std::bit_cast<std::uint64_t>(value));
-        _buffer.write(number.data(), number.size());
+        _stream.write(number.data(), number.size());
     }
     void string(std::string_view value) override { packText(value); }
     void bytes(const Bytes& value) override
@@ -83,9 +105,18 @@ public:
         }
     }
 
-    [[nodiscard]] std::string take() const { return {_buffer.data(), _buffer.size()}; }
+    [[nodiscard]] std::string take() { return std::move(_stream.bytes); }
 
 private:
+    struct Stream {
+        void write(const char* from, std::size_t count) { bytes.append(from, count); }
+        std::string bytes;
+    };
+    struct OpenRecord {
+        std::size_t start;
+        std::uint16_t entries;
+    };
+
     void packText(std::string_view text)
     {
         _packer.pack_str(static_cast<std::uint32_t>(text.size()));
@@ -98,8 +129,11 @@ private:
             to[--i] = static_cast<char>(number & 0xff);
     }
 
-    msgpack::sbuffer _buffer;
-    msgpack::packer<msgpack::sbuffer> _packer{_buffer};
+    Stream _stream;
+    msgpack::packer<Stream> _packer{_stream};
+    std::vector<OpenRecord> _records;
+    std::size_t _keyStart = 0;
+    std::size_t _keyEnd = std::string::npos; ///< where the bytes end right behind a field's key
 };
 
 // Reading

@@ -308,7 +308,7 @@ public:
 /// nest `kMaximumDepth` deep, here and in archives; so may a field of type Value in itself.
 [[nodiscard]] Result<std::shared_ptr<Record>> recordFromValue(const Value& value, const RecordClasses& classes);
 
-/// A record as a MessagePack archive, the form that is stored.
+/// A record as a MessagePack archive, the form that is stored. Null fields are left out.
 [[nodiscard]] std::string archive(const Record& record);
 /// The record in an archive. Trailing bytes are an error; declared lengths are checked against what is there.
 [[nodiscard]] Result<std::shared_ptr<Record>> unarchive(std::string_view bytes, const RecordClasses& classes);

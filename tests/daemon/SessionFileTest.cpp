@@ -83,7 +83,8 @@ TEST_F(SessionFileTest, IsWhatTheFormatSays)
 {
     start();
     const auto container = closedFile({"example.org"});
-    EXPECT_EQ(platform::Bytes(contents(container->fileUrl().filename())), platform::Bytes(platform::test::hexDumpIn("formats.md")));
+    EXPECT_EQ(platform::test::hexDump(contents(container->fileUrl().filename())),
+              platform::test::hexDump(platform::test::hexDumpIn("formats.md")));
     const auto session = container->read();
     ASSERT_TRUE(session);
     EXPECT_EQ(platform::archive(session->header()), platform::archive(header()));

@@ -3,6 +3,9 @@
 #include <fstream>
 #include <sstream>
 #include <string>
+#include <string_view>
+
+#include <fmt/format.h>
 
 namespace platform::test {
 
@@ -26,6 +29,15 @@ inline std::string hexDumpIn(const std::string& page)
         while (words >> word) bytes += static_cast<char>(std::stoi(word, nullptr, 16));
     }
     return bytes;
+}
+
+/// The same bytes as text, 16 to a line, for a page and for failures.
+inline std::string hexDump(std::string_view bytes)
+{
+    std::string text;
+    for (std::size_t i = 0; i < bytes.size(); ++i)
+        text += fmt::format("{:02x}{}", static_cast<unsigned char>(bytes[i]), i % 16 == 15 ? "\n" : " ");
+    return text;
 }
 
 } // namespace platform::test
