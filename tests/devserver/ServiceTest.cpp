@@ -180,39 +180,6 @@ TEST_F(ServiceTest, ARaisedBagVersionIsAnnounced)
     EXPECT_EQ(json(get("/bag"))["version"], Value(2));
 }
 
-TEST_F(ServiceTest, UploadsAreUnpackedAndChecked)
-{
-    const std::string digest = "1f40fc92da241694750979ee6cf582f2d5d7d28e18335de05abc54d0560e0f53"
-                               "02860c652bf08d560252aa5e74210546f369fbbbce8c12cfc7957b2652fe9a75"; // of "a"
-    const std::string a("\x4b\x04\x00", 3);
-    const auto upload = [&](Headers headers, const std::string& body) {
-        Request call = request("POST", "/feedback?v=2", body);
-        call.headers = std::move(headers);
-        return service.answer(call);
-    };
-    const Headers whole{{"Content-Encoding", "deflate"}, {"X-Quorvane-Digest", digest}};
-    EXPECT_NE(json(upload(whole, a))["error"].asString()->find("JSON"), std::string::npos)
-        << "the digest fits, \"a\" is no JSON";
-    EXPECT_EQ(upload({{"Content-Encoding", "deflate"}}, a).status, 400);
-    EXPECT_EQ(upload({{"X-Quorvane-Digest", digest}}, a).status, 400);
-    EXPECT_EQ(upload(whole, "{}").status, 400) << "not packed";
-
-    // "{}", stored
-    const std::string object("\x01\x02\x00\xfd\xff{}", 7);
-    const std::string objectDigest = "27c74670adb75075fad058d5ceaf7b20c4e7786c83bae8a32f626f9782af34c9"
-                                     "a33c2046ef60fd2a7878d378e29fec851806bbd9a67878f3a9f1cda4830763fd";
-    EXPECT_EQ(upload({{"Content-Encoding", "deflate"}, {"X-Quorvane-Digest", objectDigest}}, object).status, 200);
-    EXPECT_EQ(upload(whole, object).status, 400) << "another text's digest";
-
-    const Value kept = json(get("/control/uploads"));
-    ASSERT_EQ(kept.count(), 6u);
-    EXPECT_TRUE(kept[4]["error"].isNull());
-    EXPECT_EQ(kept[4]["json"], Value(platform::Dictionary()));
-    EXPECT_TRUE(kept[5]["error"].asString());
-    for (std::size_t i = 0; i < Uploads::kKept; ++i) static_cast<void>(upload(whole, object));
-    EXPECT_EQ(json(get("/control/uploads")).count(), Uploads::kKept) << "bounded";
-}
-
 // ---- Held back
 
 TEST_F(ServiceTest, AHangEndsByReleaseByThePeerAndByStopping)

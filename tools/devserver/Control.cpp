@@ -132,6 +132,7 @@ Answer showStatus(Service& service, const Value&, const Request&)
     return jsonAnswer(Value::dictionaryOf({{"bag_version", service.bag.version()},
                                            {"requests", service.log.total()},
                                            {"by_endpoint", service.log.byEndpoint()},
+                                           {"uploads", service.uploads.totals()},
                                            {"faults", service.faults.count()},
                                            {"max_age", service.maxAge.load()},
                                            {"catalogue", service.catalogue.entries().size()}}));

@@ -37,6 +37,7 @@ constexpr KindEntry kKinds[] = {
     {"deep", Kind::Deep, "DEPTH", 1, 1'000'000},
     {"redirect", Kind::Redirect, ""},
     {"gzipbomb", Kind::GzipBomb, "BYTES", 1, 256u << 20},
+    {"retryafter", Kind::RetryAfter, "SECONDS", 0, 31'536'000},
 };
 
 std::string kindsHelp()
@@ -144,6 +145,7 @@ void spoil(Answer& answer, const Fault& fault, const Request& request)
         answer.body = gzipOfBlanks(fault.number);
         answer.headers.emplace_back("Content-Encoding", "gzip");
         return;
+    case Kind::RetryAfter: answer.headers.emplace_back("Retry-After", std::to_string(fault.number)); return;
     }
 }
 

@@ -26,7 +26,7 @@ Options parseOptions(int argc, char** argv)
         ->capture_default_str();
     app.add_option("--cert-dir", directory, "Where the certificate is, or is made")->capture_default_str();
     app.add_option("--ready-file", readyFile, "A file that gets the line of JSON too");
-    CLI::Option* quiet = app.add_flag("-q,--quiet", options.quiet, "Nothing on standard error but failures");
+    CLI::Option* quiet = app.add_flag("-q,--quiet", options.quiet, "Nothing but the line of JSON, and failures");
     app.add_flag("-v,--verbose", options.verbose, "A line on standard error for each request")->excludes(quiet);
     try {
         app.parse(argc, argv);

@@ -79,8 +79,14 @@ Answer Service::answer(const Request& request)
     const std::vector<Fault> wanted = faults.take(endpoint);
     if (!holdBack(gate, wanted, request.connection)) return Answer{.status = 499, .cut = true}; // nobody reads it
 
-    Answer answer = answerEndpoint(endpoint, request);
+    const bool isUpload = endpoint == "upload" && request.method == "POST";
+    Upload upload = isUpload ? checkUpload(request) : Upload();
+    Answer answer = isUpload ? upload.answer() : answerEndpoint(endpoint, request);
     for (const Fault& fault : wanted) spoil(answer, fault, request);
+    if (isUpload) {
+        const std::string line = uploads.add(std::move(upload), answer);
+        if (onUpload) onUpload(line);
+    }
     return answer;
 }
 
@@ -91,10 +97,7 @@ Answer Service::answerEndpoint(std::string_view endpoint, const Request& request
                            "served here: /bag, /search, /more, /card, /flight, /images/ID, /resources/NAME, /warm, "
                            "/feedback, /crowdsourcing; and /control over HTTP");
     const bool get = request.method == "GET" || request.method == "HEAD";
-    if (endpoint == "upload") {
-        if (request.method != "POST") return errorAnswer(405, "feedback comes by POST");
-        return uploads.receive(request);
-    }
+    if (endpoint == "upload") return errorAnswer(405, "feedback comes by POST");
     if (!get) return errorAnswer(405, "only GET and HEAD here");
     if (isSearch(endpoint)) return answerSearch(endpoint, request);
     if (endpoint == "bag") {

@@ -2,6 +2,7 @@
 
 #include <atomic>
 #include <cstdint>
+#include <functional>
 #include <string>
 #include <string_view>
 
@@ -38,6 +39,8 @@ public:
     Uploads uploads;
     Gate gate;
     std::atomic<std::uint64_t> maxAge = kDefaultMaxAge; ///< seconds; "max_age" of result sets
+    /// Gets a line about every upload. Set before the first request.
+    std::function<void(const std::string&)> onUpload;
 
 private:
     [[nodiscard]] Answer answerEndpoint(std::string_view endpoint, const Request& request);

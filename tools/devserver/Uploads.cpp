@@ -1,13 +1,12 @@
 #include "tools/devserver/Uploads.h"
 
 #include <array>
-#include <optional>
 
 #include <fmt/format.h>
 #include <openssl/evp.h>
 
 #include "platform/Error.h"
-#include "tools/devserver/Compression.h"
+#include "tools/devserver/SessionShape.h"
 
 namespace devserver {
 
@@ -27,68 +26,139 @@ std::string sha512(std::string_view text)
     return hexadecimal;
 }
 
-struct Checked {
-    std::string text;
-    Value json;
-    std::optional<std::string> error;
-};
-
-Checked check(const Request& request, const std::string* digest)
+std::optional<std::string> shapeProblem(const Upload& upload)
 {
-    const std::string* encoding = findHeader(request.headers, "Content-Encoding");
-    if (!encoding || *encoding != "deflate") return {{}, {}, "no header \"Content-Encoding: deflate\""};
-    auto text = inflateRaw(request.body, Uploads::kMaximumUnpacked);
-    if (!text) return {{}, {}, text.error()};
-    Checked checked{std::move(*text), {}, {}};
-    auto json = platform::parseJson(checked.text, Uploads::kMaximumUnpacked);
-    if (!json)
-        checked.error = "not JSON: " + json.error().reason();
-    else
-        checked.json = std::move(*json);
-    if (!digest)
-        checked.error = "no header \"X-Quorvane-Digest\"";
-    else if (*digest != sha512(checked.text))
-        checked.error = "the digest is another one than that of the JSON text";
-    return checked;
+    if (upload.path == "/feedback") {
+        if (auto problem = sessionShapeProblem(upload.json)) return "not a session: " + *problem;
+    } else if (!upload.json.asDictionary()) {
+        return "the JSON is no object";
+    }
+    return std::nullopt;
+}
+
+/// A text for one line: without control characters.
+std::string oneLine(std::string text)
+{
+    for (char& c : text)
+        if (static_cast<unsigned char>(c) < 0x20 || c == 0x7f) c = ' ';
+    return text;
 }
 
 } // namespace
 
-Answer Uploads::receive(const Request& request)
+Answer Upload::answer() const
 {
-    const std::string* digest = findHeader(request.headers, "X-Quorvane-Digest");
-    Checked checked = check(request, digest);
+    if (problem) return errorAnswer(400, *problem);
+    return jsonAnswer(Value::dictionaryOf({{"received", size}}));
+}
+
+Upload checkUpload(const Request& request)
+{
+    Upload upload{.path = request.path, .query = request.query, .packedSize = request.body.size()};
+    if (const std::string* digest = findHeader(request.headers, "X-Quorvane-Digest")) upload.digest = *digest;
+    const auto refused = [&upload](std::string problem) {
+        upload.problem = std::move(problem);
+        return std::move(upload);
+    };
+
+    const std::string* encoding = findHeader(request.headers, "Content-Encoding");
+    if (!encoding || *encoding != "deflate") return refused("no header \"Content-Encoding: deflate\"");
+    const auto text = tavrin::tools::inflateRaw(request.body, tavrin::tools::kMaximumUpload);
+    if (!text) return refused(text.error());
+    upload.size = text->size();
+    upload.digestFits = upload.digest && *upload.digest == sha512(*text);
+    auto json = platform::parseJson(*text, tavrin::tools::kMaximumUpload);
+    if (json) upload.json = std::move(*json);
+    if (!upload.digest) return refused("no header \"X-Quorvane-Digest\"");
+    if (!upload.digestFits) return refused("the digest is another one than that of the JSON text");
+    if (!json) return refused("not JSON: " + json.error().reason());
+    upload.problem = shapeProblem(upload);
+    return upload;
+}
+
+Uploads::Seen& Uploads::_seen(const std::string& digest)
+{
+    const auto [found, isNew] = _digests.try_emplace(digest);
+    if (isNew) _digestsByAge.push_back(digest);
+    if (_digestsByAge.size() > kDigests) {
+        _digests.erase(_digestsByAge.front());
+        _digestsByAge.pop_front();
+    }
+    return found->second;
+}
+
+std::string Uploads::add(Upload upload, const Answer& answer)
+{
+    const std::string* agent = upload.json["agent"].asString();
+    const std::size_t events = upload.json["fb"].count();
+    const bool taken = answer.status == 200 && !answer.cut;
 
     const std::lock_guard lock(_mutex);
-    _kept.emplace_back(checked.text.size(),
-                       Value::dictionaryOf({{"number", ++_count},
-                                            {"path", request.path},
-                                            {"query", request.query},
-                                            {"size", checked.text.size()},
-                                            {"packed_size", request.body.size()},
-                                            {"digest", digest ? Value(*digest) : Value()},
-                                            {"error", checked.error ? Value(*checked.error) : Value()},
-                                            {"json", std::move(checked.json)}}));
-    _keptBytes += checked.text.size();
+    // A digest that doesn't fit tells nothing of what came.
+    Seen none;
+    Seen& seen = upload.digestFits ? _seen(*upload.digest) : none;
+    const std::uint64_t repeat = seen.received++;
+    ++_totals.received;
+    if (repeat > 0) ++_totals.repeats;
+    if (taken) {
+        ++_totals.taken;
+        if (seen.taken++ == 0) _totals.events += events;
+    }
+
+    std::string line = fmt::format("upload {}: {}{}, {}, {}, {} bytes packed to {}, {}{}", ++_lastNumber, upload.path,
+                                   upload.query.empty() ? "" : "?" + upload.query,
+                                   agent ? "agent " + *agent : "no agent", fmt::format("{} events", events),
+                                   upload.size, upload.packedSize, upload.digestFits ? "digest ok" : "digest wrong",
+                                   repeat > 0 ? fmt::format(", repeat {}", repeat) : "");
+    line += fmt::format(" → {}{}", answer.status, answer.cut ? ", cut" : "");
+    if (upload.problem) line += ": " + *upload.problem;
+
+    _kept.push_back({upload.size, Value::dictionaryOf({{"number", _lastNumber},
+                                                       {"path", upload.path},
+                                                       {"query", upload.query},
+                                                       {"size", upload.size},
+                                                       {"packed_size", upload.packedSize},
+                                                       {"digest", upload.digest ? Value(*upload.digest) : Value()},
+                                                       {"digest_ok", upload.digestFits},
+                                                       {"repeat", repeat},
+                                                       {"status", answer.status},
+                                                       {"cut", answer.cut},
+                                                       {"agent", agent ? Value(*agent) : Value()},
+                                                       {"events", events},
+                                                       {"error", upload.problem ? Value(*upload.problem) : Value()},
+                                                       {"json", std::move(upload.json)}})});
+    _keptBytes += upload.size;
     while (_kept.size() > kKept || (_keptBytes > kMaximumKeptBytes && _kept.size() > 1)) {
-        _keptBytes -= _kept.front().first;
+        _keptBytes -= _kept.front().size;
         _kept.pop_front();
     }
-    if (checked.error) return errorAnswer(400, *checked.error);
-    return jsonAnswer(Value::dictionaryOf({{"received", checked.text.size()}}));
+    return oneLine(std::move(line));
 }
 
 Value Uploads::list() const
 {
     const std::lock_guard lock(_mutex);
     Value::Array uploads;
-    for (const auto& [size, upload] : _kept) uploads.push_back(upload);
+    for (const Kept& kept : _kept) uploads.push_back(kept.value);
     return uploads;
+}
+
+Value Uploads::totals() const
+{
+    const std::lock_guard lock(_mutex);
+    return Value::dictionaryOf({{"received", _totals.received},
+                                {"taken", _totals.taken},
+                                {"refused", _totals.received - _totals.taken},
+                                {"repeats", _totals.repeats},
+                                {"events", _totals.events}});
 }
 
 void Uploads::clear()
 {
     const std::lock_guard lock(_mutex);
+    _totals = {};
+    _digests.clear();
+    _digestsByAge.clear();
     _kept.clear();
     _keptBytes = 0;
 }

@@ -42,6 +42,12 @@ void printRequest(const Request& request, const Answer& answer, std::chrono::ste
                request.query.empty() ? "" : "?", request.query, answer.status, answer.body.size(), taken.count());
 }
 
+void printUpload(const std::string& line)
+{
+    std::fputs((line + "\n").c_str(), stdout);
+    std::fflush(stdout);
+}
+
 std::expected<void, std::string> run(const Options& options, const sigset_t& signals)
 {
     const auto certificate =
@@ -71,9 +77,6 @@ std::expected<void, std::string> run(const Options& options, const sigset_t& sig
         if (options.verbose) printRequest(request, answer, begin);
         return answer;
     };
-    http.start(handler);
-    https.start(handler);
-
     const std::string ready =
         platform::toJson(platform::Value::dictionaryOf({{"http", fmt::format("http://{}:{}", host, *httpPort)},
                                                         {"https", base},
@@ -87,11 +90,15 @@ std::expected<void, std::string> run(const Options& options, const sigset_t& sig
     if (result) {
         std::fputs(ready.c_str(), stdout);
         std::fflush(stdout);
-        if (!options.quiet)
+        if (!options.quiet) {
             fmt::print(stderr,
                        "tavrin-devserver: {} entries; the bag is at {}/bag\n"
                        "  SSL_CERT_FILE={} makes clients trust it; docs/devserver.md tells the rest\n",
                        service.catalogue.entries().size(), base, certificate->certificate.string());
+            service.onUpload = printUpload;
+        }
+        http.start(handler); // now, so that the line of JSON is the first
+        https.start(handler);
         int signal = 0;
         sigwait(&signals, &signal);
     }
@@ -112,6 +119,7 @@ int main(int argc, char** argv)
     sigaddset(&signals, SIGINT);
     sigaddset(&signals, SIGTERM);
     pthread_sigmask(SIG_BLOCK, &signals, nullptr);
+    std::signal(SIGPIPE, SIG_IGN); // whoever read the first line may be gone when there is another
     try {
         const auto result = run(options, signals);
         if (result) return 0;
