@@ -143,6 +143,30 @@ Result<TAVAnswer> TAVEndpointClient::request(const TAVRequest& request, const TA
     return answerTo({platform::toValue(request), platform::toValue(configuration)});
 }
 
+Result<std::unique_ptr<TAVFlusherClient>> TAVFlusherClient::connect(const std::string& endpoint,
+                                                                    TAVFlusherListener& listener)
+{
+    auto client = open(endpoint);
+    if (!client) return std::unexpected(std::move(client.error()));
+    (*client)->onSignal([&listener](std::string_view, std::string_view member, const ipc::Message& message) {
+        const Value& argument = message.args.empty() ? Value() : message.args.front();
+        if (member == "FlushedData" && argument.asBytes())
+            listener.flushedData(*argument.asBytes());
+        else if (member == "ReceivedFeedbackDescription" && argument.asString())
+            listener.receivedFeedbackDescription(*argument.asString());
+        else if (member == "WorkDone")
+            listener.workDone();
+    });
+    return std::unique_ptr<TAVFlusherClient>(new TAVFlusherClient(std::move(*client), flusherInterface()));
+}
+
+Result<void> TAVFlusherClient::initiateConnection(FlusherIntent intent)
+{
+    const auto answer = call("InitiateConnectionWithIntent", {static_cast<std::uint64_t>(intent)});
+    if (!answer) return std::unexpected(answer.error());
+    return {};
+}
+
 std::string TAVClient::defaultAddress()
 {
     return "unix:path=" + (platform::Directories::fromEnvironment().runtime / "com.quorvane.tavrind/socket").string();
@@ -175,9 +199,13 @@ void TAVClient::send(const TAVRequest& request, AnswerHandler handler)
     sendRequest({platform::toValue(request)}, std::move(handler));
 }
 
-void TAVClient::reportEvent(const std::string& event, std::int64_t queryId, const ZRFeedback& feedback)
+void TAVClient::reportEvent(const std::string& event, std::int64_t queryId, const ZRFeedback& feedback,
+                            std::function<void(Result<void>)> taken)
 {
-    TAVConnection::send("ReportEvent", {event, queryId, platform::toValue(feedback)}, [](const auto&) {});
+    TAVConnection::send("ReportEvent", {event, queryId, platform::toValue(feedback)},
+                        [taken = std::move(taken)](const Result<ipc::Message>& message) {
+                            if (taken) taken(message ? Result<void>() : std::unexpected(message.error()));
+                        });
 }
 
 Result<Value::Array> TAVClient::feedback()

@@ -15,6 +15,8 @@
 namespace tavrin {
 
 class TAVBag;
+class TAVFlusherListener;
+enum class FlusherIntent : std::uint64_t;
 struct TAVReply;
 struct TAVRequest;
 struct TAVSessionConfiguration;
@@ -43,7 +45,7 @@ struct TAVResourceAnswer {
     std::optional<platform::Error> error;
 };
 
-/// What all three kinds of connection share. One thread; callbacks run inside `wait` and the calls that wait.
+/// What all kinds of connection share. One thread; callbacks run inside `wait` and the calls that wait.
 class TAVConnection {
 public:
     using AnswerHandler = std::function<void(platform::Result<TAVAnswer>)>;
@@ -88,6 +90,24 @@ private:
     using TAVConnection::TAVConnection;
 };
 
+/// A connection to the flusher bridge, whose address `TAVClient::listenToFlusher` answers. A tool that watches then waits:
+///
+///     auto bridge = tavrin::TAVFlusherClient::connect(endpoint, listener);
+///     (*bridge)->initiateConnection(FlusherIntent::WatchEvents);
+///     (*bridge)->wait([&] { return seenEnough; }, timeout);
+class TAVFlusherClient : public TAVConnection {
+public:
+    /// `listener` must outlive the connection.
+    [[nodiscard]] static platform::Result<std::unique_ptr<TAVFlusherClient>> connect(const std::string& endpoint,
+                                                                                     TAVFlusherListener& listener);
+
+    /// Answered once the bridge knows it; its work may be done later, see `TAVFlusherListener::workDone`.
+    platform::Result<void> initiateConnection(FlusherIntent intent);
+
+private:
+    using TAVConnection::TAVConnection;
+};
+
 /// A connection to the daemon.
 ///
 ///     auto client = tavrin::TAVClient::connect();
@@ -109,8 +129,10 @@ public:
     platform::Result<TAVBagAnswer> bag();
     platform::Result<TAVAnswer> request(const TAVRequest& request);
     void send(const TAVRequest& request, AnswerHandler handler);
-    /// Reports what the user saw or did. Nobody answers; it is out once `wait` or another call has run.
-    void reportEvent(const std::string& event, std::int64_t queryId, const ZRFeedback& feedback);
+    /// Reports what the user saw or did. It is out once `wait` or another call has run; inside of which `taken` is called
+    /// when the daemon has it, or with the reason why it didn't take it.
+    void reportEvent(const std::string& event, std::int64_t queryId, const ZRFeedback& feedback,
+                     std::function<void(platform::Result<void>)> taken = {});
     /// The feedback of the current session, as it would be uploaded.
     platform::Result<platform::Value::Array> feedback();
     /// The address of the flusher bridge.

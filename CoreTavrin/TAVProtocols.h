@@ -78,6 +78,14 @@ public:
                             platform::Reply<platform::Value> reply) = 0;
 };
 
+/// What a tool tells the flusher bridge that it is there for. Numbers are the wire's; the bridge may get others.
+enum class FlusherIntent : std::uint64_t {
+    WatchFlushes, ///< `flushedData` goes to this tool
+    WatchEvents,  ///< `receivedFeedbackDescription` goes to this tool
+    StopFlushing, ///< no flush in the background until the next dump; then `workDone`
+    Dump,         ///< all sessions end and are flushed now; then `workDone`
+};
+
 /// What the flusher bridge takes from a diagnostic tool. Calls arrive on that connection's queue.
 class TAVFlusherXPC {
 public:

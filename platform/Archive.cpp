@@ -272,7 +272,44 @@ public:
     std::string string() override { return std::string(take(Value::Type::String, "a string").text()); }
     Bytes bytes() override { return Bytes(std::string(take(Value::Type::Bytes, "bytes").text())); }
     Date date() override { return Date(Duration(take(Value::Type::Date, "a date").integer)); }
-    Value value() override { return value(0); }
+    Value value() override { return value(kMaximumDepth); }
+    /// The value at hand, whose arrays and dictionaries may nest `levels` deep.
+    Value value(std::size_t levels)
+    {
+        const Token token = here();
+        if (failed()) return {};
+        if (token.type >= Value::Type::Array && levels == 0) {
+            fail("nested too deep");
+            return {};
+        }
+        ++_next;
+        switch (token.type) {
+        case Value::Type::Null: return {};
+        case Value::Type::Bool: return token.boolean;
+        case Value::Type::Int: return token.integer;
+        case Value::Type::UInt: return token.unsignedInteger;
+        case Value::Type::Double: return token.real;
+        case Value::Type::String: return token.text();
+        case Value::Type::Bytes: return Bytes(std::string(token.text()));
+        case Value::Type::Date: return Date(Duration(token.integer));
+        case Value::Type::Array: {
+            Value::Array array;
+            array.reserve(token.size);
+            for (std::uint32_t i = 0; i < token.size; ++i) array.push_back(value(levels - 1));
+            return array;
+        }
+        case Value::Type::Dictionary: {
+            Dictionary dictionary;
+            dictionary.reserve(token.size);
+            for (std::uint32_t i = 0; i < token.size; ++i) {
+                std::string key = string();
+                dictionary.set(std::move(key), value(levels - 1));
+            }
+            return dictionary;
+        }
+        }
+        return {};
+    }
 
     void skip() override
     {
@@ -336,43 +373,6 @@ private:
         _left.push_back(size);
     }
 
-    Value value(std::size_t depth)
-    {
-        const Token token = here();
-        if (failed()) return {};
-        if (token.type >= Value::Type::Array && depth == kMaximumDepth) {
-            fail("nested too deep");
-            return {};
-        }
-        ++_next;
-        switch (token.type) {
-        case Value::Type::Null: return {};
-        case Value::Type::Bool: return token.boolean;
-        case Value::Type::Int: return token.integer;
-        case Value::Type::UInt: return token.unsignedInteger;
-        case Value::Type::Double: return token.real;
-        case Value::Type::String: return token.text();
-        case Value::Type::Bytes: return Bytes(std::string(token.text()));
-        case Value::Type::Date: return Date(Duration(token.integer));
-        case Value::Type::Array: {
-            Value::Array array;
-            array.reserve(token.size);
-            for (std::uint32_t i = 0; i < token.size; ++i) array.push_back(value(depth + 1));
-            return array;
-        }
-        case Value::Type::Dictionary: {
-            Dictionary dictionary;
-            dictionary.reserve(token.size);
-            for (std::uint32_t i = 0; i < token.size; ++i) {
-                std::string key = string();
-                dictionary.set(std::move(key), value(depth + 1));
-            }
-            return dictionary;
-        }
-        }
-        return {};
-    }
-
     std::vector<Token> _tokens;
     std::size_t _next = 0;
     std::vector<std::uint32_t> _left; ///< what is left to read of each container that was entered
@@ -406,7 +406,7 @@ Result<Value> valueFromArchive(std::string_view bytes)
 {
     static const RecordClasses kNone;
     ArchiveDecoder decoder(bytes, kNone);
-    Value value = decoder.value();
+    Value value = decoder.value(2 * kMaximumDepth); // records that nest, and a value in the innermost
     if (auto error = decoder.error()) return std::unexpected(std::move(*error));
     return value;
 }

@@ -69,13 +69,13 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
     }
 
     /// Writes what was set over what the file has by now.
-    void write()
+    Result<void> write()
     {
         std::lock_guard writer(writing);
         {
             std::lock_guard lock(mutex);
             writeQueued = false;
-            if (dirty.empty()) return;
+            if (dirty.empty()) return {};
         }
         if (auto made = files->createDirectories(path.parent_path()); !made) return writeFailed(made.error());
         // Against others who edit the file in the same way; where there can be no lock, we go on without.
@@ -102,11 +102,10 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
         const std::string text = toJson(merged, JsonStyle::Pretty) + "\n";
         const auto done = text.size() <= kMaximumSize ? files->writeAtomically(path, text)
                                                       : Result<void>(std::unexpected(Error::posix(EFBIG)));
-        if (!done) {
-            std::lock_guard lock(mutex);
-            dirty.merge(written);
-            writeFailed(done.error());
-        }
+        if (done) return {};
+        std::lock_guard lock(mutex);
+        dirty.merge(written);
+        return writeFailed(done.error());
     }
 
     /// A broken file is somebody's work too: it isn't written over, but kept beside.
@@ -118,9 +117,10 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
             defaultLog().error("user defaults {} are broken, kept as {}.corrupt", path.string(), path.string());
     }
 
-    void writeFailed(const Error& error) const
+    Result<void> writeFailed(const Error& error) const
     {
         defaultLog().error("user defaults {} can't be written: {}", path.string(), error.description());
+        return std::unexpected(error);
     }
 };
 
@@ -201,12 +201,12 @@ void UserDefaults::set(std::string_view key, Value value)
     if (!_impl->files) return;
     _impl->dirty.emplace(key);
     if (!_impl->writeQueue || std::exchange(_impl->writeQueued, true)) return;
-    _impl->writeQueue->async([impl = _impl] { impl->write(); });
+    _impl->writeQueue->async([impl = _impl] { (void)impl->write(); });
 }
 
-void UserDefaults::synchronize()
+Result<void> UserDefaults::synchronize()
 {
-    if (_impl->files) _impl->write();
+    return _impl->files ? _impl->write() : Result<void>();
 }
 
 void UserDefaults::reload()

@@ -9,6 +9,7 @@
 #include <string_view>
 
 #include "platform/Date.h"
+#include "platform/Error.h"
 #include "platform/Value.h"
 
 namespace platform {
@@ -51,8 +52,8 @@ public:
     /// Dates are kept as seconds since 1970. A null removes the key.
     void set(std::string_view key, Value value);
     void remove(std::string_view key) { set(key, Value()); }
-    /// Writes what was set, now. Failures are logged, and tried again with the next write.
-    void synchronize();
+    /// Writes what was set, now. Failures are logged and answered, and tried again with the next write.
+    Result<void> synchronize();
     /// Reads the file again, as the watch does.
     void reload();
     /// What the file has (without registered defaults), for diagnostics.

@@ -122,6 +122,10 @@ TEST(Record, EveryFieldSurvivesBothEncodings)
         EXPECT_EQ((*longer)->note, std::nullopt);
     }
     EXPECT_EQ(value["class"], Value("Longer"));
+    const Value plain = valueFromArchive(bytes).value();
+    EXPECT_EQ(plain["class"], Value("Longer"));
+    EXPECT_EQ(plain["any"], everyKind());
+    EXPECT_EQ(plain["parts"][1]["score"], Value(2.5));
     EXPECT_FALSE(castRecord<Part>(unarchive(bytes, classes())));
 }
 
@@ -284,6 +288,9 @@ TEST(Record, DepthIsBounded)
     EXPECT_FALSE(recordFromValue(toValue(*chain(kMaximumDepth + 1)), classes()));
     EXPECT_TRUE(unarchive(archive(nested(kMaximumDepth)), classes()));
     EXPECT_FALSE(unarchive(archive(nested(kMaximumDepth + 1)), classes()));
+    EXPECT_TRUE(valueFromArchive(archive(*chain(kMaximumDepth))));
+    EXPECT_TRUE(valueFromArchive(archive(nested(kMaximumDepth)))) << "below a record, too";
+    EXPECT_FALSE(valueFromArchive(std::string(1'000'000, '\x91') + '\x01'));
     EXPECT_TRUE(unarchive("\x82\xa5"
                           "class\xa4"
                           "Part\xa1x" +
@@ -294,11 +301,17 @@ TEST(Record, DepthIsBounded)
 TEST(Record, DamagedArchivesNeverCrash)
 {
     const std::string bytes = archive(*sample());
-    for (std::size_t length = 0; length < bytes.size(); ++length)
+    for (std::size_t length = 0; length < bytes.size(); ++length) {
         EXPECT_EQ(reasonOf(unarchive(std::string_view(bytes).substr(0, length), classes())), "truncated");
+        EXPECT_EQ(reasonOf(valueFromArchive(std::string_view(bytes).substr(0, length))), "truncated");
+    }
     for (std::size_t bit = 0; bit < bytes.size() * 8; ++bit) {
         std::string damaged = bytes;
         damaged[bit / 8] = static_cast<char>(damaged[bit / 8] ^ 1 << (bit % 8));
+        if (const auto value = valueFromArchive(damaged)) {
+            const std::string again = archiveValue(*value);
+            EXPECT_EQ(archiveValue(valueFromArchive(again).value()), again) << "bit " << bit;
+        }
         if (const auto record = unarchive(damaged, classes())) {
             const std::string again = archive(**record);
             EXPECT_EQ(archive(*unarchive(again, classes()).value()), again) << "bit " << bit;

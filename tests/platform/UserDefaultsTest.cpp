@@ -185,6 +185,7 @@ TEST_F(UserDefaultsTest, AWriteThatFailedIsTriedAgainWithTheNext)
         memory.fault = [&](std::string_view asked, const fs::path&) { return asked == operation ? ENOSPC : 0; };
         defaults.set("a", 1);
         executor.drain();
+        EXPECT_EQ(defaults.synchronize().error().code, ENOSPC);
         EXPECT_EQ(defaults.integer("a"), 1) << "readers see it all the same";
         EXPECT_TRUE(memory.files.empty());
         memory.fault = nullptr;
@@ -193,7 +194,7 @@ TEST_F(UserDefaultsTest, AWriteThatFailedIsTriedAgainWithTheNext)
         ASSERT_TRUE(memory.files.contains("/nowhere/suite.json")) << operation;
         EXPECT_EQ(parseJson(memory.files.at("/nowhere/suite.json"), 1 << 20), Value(Dictionary{{"a", 1}, {"b", 2}}));
     }
-    EXPECT_EQ(log.count("can't be written"), 2);
+    EXPECT_EQ(log.count("can't be written"), 4);
 }
 
 } // namespace

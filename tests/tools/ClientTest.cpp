@@ -36,6 +36,7 @@ struct EchoDaemon final : TAVDaemonXPC, TAVDiagnosticsXPC, TAVEndpointXPC {
     std::shared_ptr<TAVClientXPC> client;
     std::weak_ptr<platform::ipc::Connection> connection;
     std::string endpoint;
+    std::unique_ptr<platform::ipc::Listener> flusher;
     std::vector<RequestReply> held;
     std::mutex mutex;
     std::vector<std::string> events;
@@ -73,7 +74,7 @@ struct EchoDaemon final : TAVDaemonXPC, TAVDiagnosticsXPC, TAVEndpointXPC {
         for (const std::string& event : events) all.push_back(Value::dictionaryOf({{"event", event}}));
         reply(std::move(all), std::nullopt);
     }
-    void listenToFlusher(platform::Reply<std::string> reply) override { reply("unix:path=/flusher"); }
+    void listenToFlusher(platform::Reply<std::string> reply) override { reply(flusher ? flusher->endpoint() : "unix:path=/flusher"); }
     void listSessions(platform::Reply<Value::Array> reply) override
     {
         reply({Value::dictionaryOf({{"identifier", "com.example"}, {"agent", "Example/1"}})});
@@ -130,6 +131,7 @@ struct ClientTest : testing::Test {
         thread.join();
         for (RequestReply& reply : daemon->held) reply.abandon();
         connections.clear();
+        daemon->flusher.reset();
         listener.reset();
         endpoint.reset();
         transport.reset();
@@ -218,6 +220,56 @@ TEST_F(ClientTest, SilenceEndsInATimeOut)
     const auto answer = client->request(search("silence", 1));
     ASSERT_FALSE(answer);
     EXPECT_THAT(answer.error().reason(), testing::HasSubstr("no answer to Request within 0.02 s"));
+}
+
+/// A bridge that tells its tool of the intent, in all three ways.
+struct EchoBridge final : TAVFlusherXPC {
+    std::shared_ptr<TAVFlusherListener> tool;
+    void initiateConnectionWithIntent(std::uint64_t intent) override
+    {
+        tool->flushedData(platform::Bytes("body"));
+        tool->receivedFeedbackDescription("intent " + std::to_string(intent));
+        tool->workDone();
+    }
+};
+
+struct Notes final : TAVFlusherListener {
+    std::vector<std::string> all;
+    void flushedData(const platform::Bytes& body) override { all.emplace_back(body.view()); }
+    void receivedFeedbackDescription(const std::string& description) override { all.push_back(description); }
+    void workDone() override { all.emplace_back("done"); }
+};
+
+TEST_F(ClientTest, TheBridgeAnswersAndTellsItsTool)
+{
+    auto bridge = std::make_shared<EchoBridge>();
+    daemon->flusher = transport->anonymous(flusherInterface(), "test.flusher");
+    daemon->flusher->setAcceptor([&](auto connection) {
+        bridge->tool = makeFlusherListenerProxy(connection);
+        connection->exportObject(flusherHandler(bridge));
+        connection->resume();
+        connections.push_back(std::move(connection));
+    });
+    daemon->flusher->resume();
+
+    Notes notes;
+    const auto tool = TAVFlusherClient::connect(client->listenToFlusher().value(), notes).value();
+    ASSERT_TRUE(tool->initiateConnection(FlusherIntent::Dump));
+    ASSERT_TRUE(tool->wait([&] { return notes.all.size() == 3; }, 30s));
+    EXPECT_EQ(notes.all, (std::vector<std::string>{"body", "intent 3", "done"}));
+}
+
+TEST_F(ClientTest, AReportedEventIsTakenOrRefused)
+{
+    std::vector<bool> taken;
+    const auto note = [&](const platform::Result<void>& result) { taken.push_back(result.has_value()); };
+    ZRErrorFeedback large;
+    large.error = platform::Error::withReason("D", 1, std::string(9u << 20, 'x')); // more than a message may have
+    client->reportEvent("seen", 1, ZRSearchViewAppearFeedback(), note);
+    client->reportEvent("failed", 1, large, note);
+    ASSERT_TRUE(client->wait([&] { return taken.size() == 2; }, 30s));
+    EXPECT_EQ(taken, (std::vector<bool>{true, false}));
+    EXPECT_TRUE(client->status()) << "the connection lives on";
 }
 
 TEST(Client, WithoutADaemonSaysWhereItLooked)

@@ -21,6 +21,12 @@ void addSearchCommand(CLI::App& app, Command& chosen);
 void addOtherRequestCommands(CLI::App& app, Command& chosen);
 /// bag, sessions, status and stats.
 void addInspectCommands(CLI::App& app, Command& chosen);
+/// watch; flush watch, stop and dump.
+void addFlusherCommands(CLI::App& app, Command& chosen);
+/// feedback, and feedback send and records.
+void addFeedbackCommands(CLI::App& app, Command& chosen);
+/// session.
+void addSessionCommand(CLI::App& app, Command& chosen);
 /// defaults read, write, delete and list.
 void addDefaultsCommands(CLI::App& app, Command& chosen);
 

@@ -7,6 +7,8 @@
 #include <fmt/format.h>
 
 #include "platform/Files.h"
+#include "platform/Log.h"
+#include "platform/UserDefaults.h"
 #include "tools/tavrinctl/Commands.h"
 
 namespace tavrin::ctl {
@@ -16,7 +18,7 @@ using platform::Value;
 
 namespace {
 
-constexpr std::size_t kMaximumFileSize = 1u << 20;
+constexpr std::size_t kMaximumFileSize = 4u << 20;
 
 struct KnownKey {
     std::string_view key;
@@ -55,12 +57,16 @@ Dictionary readSettings(const std::filesystem::path& path)
     return *value->asDictionary();
 }
 
-void writeSettings(const std::filesystem::path& path, const Dictionary& settings)
+/// Sets one key as the daemon does it: under the file's lock, over what others have written meanwhile. Null removes it.
+Dictionary change(const std::filesystem::path& path, const std::string& key, const Value& value)
 {
-    auto files = platform::makeSystemFiles();
-    auto written = files->createDirectories(path.parent_path());
-    if (written) written = files->writeAtomically(path, platform::toJson(settings, platform::JsonStyle::Pretty) + "\n");
-    if (!written) throw Failure(fmt::format("{} can't be written: {}", path.string(), written.error().reason()));
+    platform::Log::threshold = platform::LogLevel::Fault; // failures are told below
+    const auto files = platform::makeSystemFiles();
+    platform::UserDefaults settings(*files, path, nullptr);
+    settings.set(key, value);
+    if (const auto written = settings.synchronize(); !written)
+        throw Failure(fmt::format("{} can't be written: {}", path.string(), written.error().reason()));
+    return settings.contents();
 }
 
 bool fits(const Value& value, std::string_view type)
@@ -138,12 +144,10 @@ void addDefaultsCommands(CLI::App& app, Command& chosen)
     CLI::App* write =
         add("write", "Set one; the daemon sees it at once", [](const Options& common, const DefaultsOptions& mine) {
             const auto path = settingsFile(mine.suite);
-            Dictionary settings = readSettings(path);
-            settings.set(mine.key, settingValue(mine.key, mine.value));
-            writeSettings(path, settings);
-            if (common.json)
-                printJson(
-                    Value::dictionaryOf({{mine.key, settings.find(mine.key) ? *settings.find(mine.key) : Value()}}));
+            (void)readSettings(path); // a broken file is for its owner to mend
+            const Value value = settingValue(mine.key, mine.value);
+            change(path, mine.key, value);
+            if (common.json) printJson(Value::dictionaryOf({{mine.key, value}}));
         });
     write->add_option("key", options->key, "Which one")->required();
     write->add_option("value", options->value, "JSON, or a text")->required();
@@ -151,9 +155,8 @@ void addDefaultsCommands(CLI::App& app, Command& chosen)
     add("delete", "Unset one",
         [](const Options& common, const DefaultsOptions& mine) {
             const auto path = settingsFile(mine.suite);
-            Dictionary settings = readSettings(path);
-            if (!settings.remove(mine.key)) throw Failure(fmt::format("{} is not set", mine.key));
-            writeSettings(path, settings);
+            if (!readSettings(path).contains(mine.key)) throw Failure(fmt::format("{} is not set", mine.key));
+            const Dictionary settings = change(path, mine.key, Value());
             if (common.json) printJson(settings);
         })
         ->add_option("key", options->key, "Which one")

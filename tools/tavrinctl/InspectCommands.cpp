@@ -2,12 +2,14 @@
 
 #include <charconv>
 #include <cmath>
+#include <utility>
 
 #include <CLI/CLI.hpp>
 #include <fmt/chrono.h>
 #include <fmt/format.h>
 
 #include "CoreTavrin/TAVBag.h"
+#include "tools/tavrinctl/Books.h"
 #include "tools/tavrinctl/Commands.h"
 
 namespace tavrin::ctl {
@@ -105,6 +107,10 @@ void showStatus(const Options& options)
     row("bag", bagText);
     row("feedback",
         status["sharedSession"] == Value(true) ? "one session for all clients" : "one session for each client");
+    if (const Value& books = status["feedback"]; books.asDictionary()) {
+        const char* name = "events";
+        for (const std::string& line : bookLines(books)) row(std::exchange(name, ""), line);
+    }
     row("clients", fmt::format("{}", status["sessions"].count()));
     for (std::size_t i = 0; i < status["connections"].count(); ++i) {
         const Value& connection = status["connections"][i];

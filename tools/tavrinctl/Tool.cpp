@@ -6,6 +6,8 @@
 
 #include <fmt/format.h>
 
+#include "platform/Files.h"
+
 namespace tavrin::ctl {
 
 std::unique_ptr<TAVClient> connect(const Options& options)
@@ -28,6 +30,15 @@ Session openSession(const Options& options)
         throw Failure("the daemon refused this client: --identifier and --agent must not be empty");
     session.endpoint = valueOf(std::move(endpoint));
     return session;
+}
+
+std::string readFile(const std::string& path, std::size_t maximumSize)
+{
+    std::error_code ignored;
+    const auto found = std::filesystem::canonical(path, ignored);
+    auto bytes = platform::makeSystemFiles()->read(found.empty() ? std::filesystem::absolute(path) : found, maximumSize);
+    if (!bytes) throw Failure(fmt::format("{} can't be read: {}", path, bytes.error().reason()));
+    return std::string(bytes->view());
 }
 
 void printJson(const platform::Value& value)

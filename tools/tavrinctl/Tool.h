@@ -47,6 +47,9 @@ template <class T> [[nodiscard]] T valueOf(platform::Result<T> result)
     return std::move(*result);
 }
 
+/// A file of at most so many bytes, links followed; or a `Failure`.
+[[nodiscard]] std::string readFile(const std::string& path, std::size_t maximumSize);
+
 /// Writes a value as JSON with a line end.
 void printJson(const platform::Value& value);
 /// Writes a line to standard output.

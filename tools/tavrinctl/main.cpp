@@ -29,6 +29,9 @@ int main(int argc, char** argv)
     addSearchCommand(app, chosen);
     addOtherRequestCommands(app, chosen);
     addInspectCommands(app, chosen);
+    addFlusherCommands(app, chosen);
+    addFeedbackCommands(app, chosen);
+    addSessionCommand(app, chosen);
     addDefaultsCommands(app, chosen);
 
     try {

@@ -1,0 +1,163 @@
+#include "tools/tavrinctl/FeedbackRecords.h"
+
+#include <algorithm>
+
+#include <fmt/format.h>
+
+#include "CoreTavrin/TAVRecordClasses.h"
+#include "platform/Record.h"
+
+namespace tavrin::ctl {
+
+using platform::Dictionary;
+using platform::Value;
+
+namespace {
+
+constexpr std::string_view kQueryId = "queryId";
+
+/// Walks a record beside the JSON that it was read from, and looks for keys there that are no fields: reading skips
+/// them, and they are likely to be misspelt.
+class StrayKeys final : public platform::Encoder {
+public:
+    StrayKeys(const Value& json, std::vector<std::string>& strays) : _json(json), _strays(strays) {}
+
+    void beginRecord(std::string_view, std::size_t) override { _open.push_back({next(), place(), {}, {}, 0}); }
+    void key(std::string_view name) override
+    {
+        _open.back().key = name;
+        _open.back().fields.push_back(name);
+    }
+    void endRecord() override
+    {
+        const Open record = std::move(_open.back());
+        _open.pop_back();
+        if (!record.json.asDictionary()) return;
+        for (const auto& [key, value] : *record.json.asDictionary()) {
+            const bool isField = std::ranges::find(record.fields, key) != record.fields.end();
+            const bool isOurs = key == "class" || (_open.empty() && key == kQueryId);
+            if (!isField && !isOurs) _strays.push_back(record.place + (record.place.empty() ? "" : ".") + key);
+        }
+    }
+    void beginArray(std::size_t) override { _open.push_back({next(), place(), {}, {}, 0}); }
+    void endArray() override { _open.pop_back(); }
+    void null() override { next(); }
+    void boolean(bool) override { next(); }
+    void integer(std::int64_t) override { next(); }
+    void unsignedInteger(std::uint64_t) override { next(); }
+    void real(double) override { next(); }
+    void string(std::string_view) override { next(); }
+    void bytes(const platform::Bytes&) override { next(); }
+    void date(platform::Date) override { next(); }
+    void value(const Value&) override { next(); }
+
+private:
+    /// A record or an array that is being walked.
+    struct Open {
+        Value json;
+        std::string place;
+        std::string_view key; ///< of a record: at hand
+        std::vector<std::string_view> fields;
+        std::size_t index; ///< of an array: one behind the element at hand
+    };
+
+    /// The JSON of the value at hand.
+    Value next()
+    {
+        if (_open.empty()) return _json;
+        Open& open = _open.back();
+        return open.json.asArray() ? open.json[open.index++] : open.json[open.key];
+    }
+    /// Where it is; after `next`.
+    [[nodiscard]] std::string place() const
+    {
+        if (_open.empty()) return {};
+        const Open& open = _open.back();
+        if (open.json.asArray()) return fmt::format("{}[{}]", open.place, open.index - 1);
+        return open.place + (open.place.empty() ? "" : ".") + std::string(open.key);
+    }
+
+    const Value _json;
+    std::vector<std::string>& _strays;
+    std::vector<Open> _open;
+};
+
+/// Notes the names of a record's fields.
+class FieldNames final : public platform::Encoder {
+public:
+    Value::Array names;
+
+    void beginRecord(std::string_view, std::size_t) override {}
+    void key(std::string_view name) override { names.emplace_back(name); }
+    void endRecord() override {}
+    void beginArray(std::size_t) override {}
+    void endArray() override {}
+    void null() override {}
+    void boolean(bool) override {}
+    void integer(std::int64_t) override {}
+    void unsignedInteger(std::uint64_t) override {}
+    void real(double) override {}
+    void string(std::string_view) override {}
+    void bytes(const platform::Bytes&) override {}
+    void date(platform::Date) override {}
+    void value(const Value&) override {}
+};
+
+/// Reads one record, or says what is wrong with it.
+std::expected<ReportedEvent, std::vector<std::string>> eventIn(const Value& json)
+{
+    const auto wrong = [](std::string problem) { return std::unexpected(std::vector{std::move(problem)}); };
+    if (!json.asDictionary()) return wrong("a record is an object");
+    const Value& queryId = json[kQueryId];
+    if (!queryId.isNull() && (queryId.type() == Value::Type::Double || !queryId.asInt()))
+        return wrong(fmt::format("{}: expected a whole number", kQueryId));
+    auto record = platform::recordFromValue(json, coreRecordClasses());
+    if (!record) return wrong(record.error().reason());
+    auto feedback = std::dynamic_pointer_cast<ZRFeedback>(*record);
+    if (!feedback) return wrong(fmt::format("{} is no event", (*record)->className()));
+
+    std::vector<std::string> strays;
+    StrayKeys finder(json, strays);
+    platform::encodeRecord(finder, *feedback);
+    if (strays.empty()) return ReportedEvent{queryId.asInt().value_or(0), std::move(feedback)};
+    for (std::string& stray : strays) stray += ": no such field";
+    return std::unexpected(std::move(strays));
+}
+
+} // namespace
+
+std::expected<std::vector<ReportedEvent>, std::vector<std::string>> eventsIn(const Value& json)
+{
+    const bool isList = json.asArray() != nullptr;
+    const Value::Array records = isList ? *json.asArray() : Value::Array{json};
+    std::vector<ReportedEvent> events;
+    std::vector<std::string> problems;
+    for (std::size_t i = 0; i < records.size(); ++i) {
+        auto event = eventIn(records[i]);
+        if (event) {
+            events.push_back(std::move(*event));
+            continue;
+        }
+        const std::string* className = records[i]["class"].asString();
+        for (const std::string& problem : event.error())
+            problems.push_back(fmt::format("{}{}: {}", isList ? fmt::format("record {}", i + 1) : "the record",
+                                           className ? fmt::format(" ({})", *className) : "", problem));
+    }
+    if (!problems.empty()) return std::unexpected(std::move(problems));
+    return events;
+}
+
+Dictionary reportableRecords()
+{
+    Dictionary records;
+    for (const auto& [name, make] : coreRecordClasses()) {
+        const auto record = make();
+        if (!dynamic_cast<const ZRFeedback*>(record.get())) continue;
+        FieldNames fields;
+        platform::encodeRecord(fields, *record);
+        records.set(std::string(name), std::move(fields.names));
+    }
+    return records;
+}
+
+} // namespace tavrin::ctl

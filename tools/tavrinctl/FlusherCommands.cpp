@@ -1,0 +1,241 @@
+// tavrinctl watch, flush: the feedback pipeline, live.
+
+#include <array>
+#include <chrono>
+#include <csignal>
+#include <cstdio>
+#include <filesystem>
+#include <unistd.h>
+
+#include <CLI/CLI.hpp>
+#include <fmt/chrono.h>
+#include <fmt/format.h>
+
+#include "CoreTavrin/TAVProtocols.h"
+#include "platform/Files.h"
+#include "tools/tavrinctl/Commands.h"
+#include "tools/tavrinctl/Events.h"
+
+namespace tavrin::ctl {
+
+using platform::Value;
+
+namespace {
+
+/// What the bridge sends, to whoever wants it.
+struct Listener final : TAVFlusherListener {
+    std::function<void(const platform::Bytes&)> onFlushedData = [](const platform::Bytes&) {};
+    std::function<void(const std::string&)> onEvent = [](const std::string&) {};
+    bool done = false;
+
+    void flushedData(const platform::Bytes& body) override { onFlushedData(body); }
+    void receivedFeedbackDescription(const std::string& description) override { onEvent(description); }
+    void workDone() override { done = true; }
+};
+
+/// A tool at the bridge. The session beside it is what the daemon knows the tool by.
+struct Bridge {
+    Session session;
+    std::unique_ptr<TAVFlusherClient> client;
+
+    Bridge(const Options& options, Listener& listener)
+        : session(openSession(options)),
+          client(valueOf(TAVFlusherClient::connect(valueOf(session.client->listenToFlusher()), listener)))
+    {
+        client->setTimeout(platform::durationFromSeconds(options.timeout));
+    }
+    void initiate(FlusherIntent intent)
+    {
+        if (const auto answer = client->initiateConnection(intent); !answer) throw Failure(answer.error().reason());
+    }
+};
+
+/// From here on SIGINT and SIGTERM end the program with status 0: watching has no other end.
+void endOnSignal()
+{
+    static std::array<char, 1u << 20> buffer; // a line is one write, which a signal doesn't divide
+    std::setvbuf(stdout, buffer.data(), _IOFBF, buffer.size());
+    struct sigaction action {};
+    action.sa_handler = [](int) { _exit(EXIT_SUCCESS); };
+    for (const int signal : {SIGINT, SIGTERM}) sigaction(signal, &action, nullptr);
+}
+
+/// Shows what the bridge sends, until there was enough of it.
+class Watch {
+public:
+    /// `count` 0 is without end. `what` tells people what they are going to see.
+    Watch(const Options& options, std::uint64_t count, std::string_view what)
+        : _options(options), _count(count), _what(what)
+    {}
+
+    /// Whether one more is to be shown.
+    bool takes()
+    {
+        if (full()) return false;
+        tellAttached(); // what comes ahead of the bridge's answer comes after the first line, too
+        ++_seen;
+        return true;
+    }
+    void run(Bridge& bridge, FlusherIntent intent)
+    {
+        endOnSignal();
+        bridge.initiate(intent);
+        tellAttached();
+        if (!bridge.client->wait([this] { return full(); }, platform::Duration::max()))
+            throw Failure("the daemon closed the connection");
+    }
+
+private:
+    [[nodiscard]] bool full() const { return _count > 0 && _seen == _count; }
+    /// Scripts wait for this line before they do what they want to see.
+    void tellAttached()
+    {
+        if (std::exchange(_told, true)) return;
+        if (_options.json)
+            fmt::print(stderr, "{}\n", R"({"attached":true})");
+        else
+            fmt::print(stderr, "Attached: {}. Ctrl-C ends.\n", _what);
+    }
+
+    const Options& _options;
+    const std::uint64_t _count;
+    const std::string_view _what;
+    std::uint64_t _seen = 0;
+    bool _told = false;
+};
+
+std::string timeOfDay()
+{
+    const auto now = std::chrono::system_clock::now();
+    const auto milliseconds = std::chrono::duration_cast<std::chrono::milliseconds>(now.time_since_epoch()) % 1000;
+    return fmt::format("{:%H:%M:%S}.{:03}", fmt::localtime(std::chrono::system_clock::to_time_t(now)),
+                       milliseconds.count());
+}
+
+void watchEvents(const Options& options, std::uint64_t count)
+{
+    Watch watch(options, count, "here is every event from now on");
+    Listener listener;
+    listener.onEvent = [&](const std::string& description) {
+        if (!watch.takes()) return;
+        if (options.json) return printLine(description);
+        const auto event = platform::parseJson(description);
+        printLine(dim(timeOfDay()) + "  " + (event ? eventLine(*event) : printable(description)));
+    };
+    Bridge bridge(options, listener);
+    watch.run(bridge, FlusherIntent::WatchEvents);
+}
+
+void showBody(const Options& options, const FlushedBody& body)
+{
+    printLine(options.json ? platform::toJson(describe(body)) : summary(body));
+}
+
+void watchFlushes(const Options& options, std::uint64_t count)
+{
+    Watch watch(options, count, "here is every body that is flushed from now on");
+    Listener listener;
+    listener.onFlushedData = [&](const platform::Bytes& packed) {
+        if (watch.takes()) showBody(options, flushedBody(packed));
+    };
+    Bridge bridge(options, listener);
+    watch.run(bridge, FlusherIntent::WatchFlushes);
+}
+
+/// Sends a command to the bridge, and waits until its work is done.
+void work(const Options& options, Bridge& bridge, const Listener& listener, FlusherIntent intent)
+{
+    bridge.initiate(intent);
+    if (bridge.client->wait([&] { return listener.done; }, platform::durationFromSeconds(options.timeout))) return;
+    if (!bridge.client->connected()) throw Failure("the daemon closed the connection");
+    throw Failure(fmt::format("the work was not done within {:g} s; --timeout gives it longer", options.timeout));
+}
+
+void stopFlushing(const Options& options)
+{
+    Listener listener;
+    Bridge bridge(options, listener);
+    work(options, bridge, listener, FlusherIntent::StopFlushing);
+    if (options.json)
+        printJson(Value::dictionaryOf({{"stopped", true}}));
+    else
+        printLine("Nothing is flushed in the background until \"tavrinctl flush dump\".");
+}
+
+/// Saves a body as DIR/flushed-N.json, under the first number that is free.
+std::filesystem::path save(const std::filesystem::path& directory, const FlushedBody& body)
+{
+    const auto files = platform::makeSystemFiles();
+    const auto failed = [&](const platform::Error& error) {
+        return Failure(fmt::format("{} can't be written: {}", directory.string(), error.reason()));
+    };
+    if (const auto made = files->createDirectories(directory); !made) throw failed(made.error());
+    for (std::uint64_t number = 1;; ++number) {
+        const auto path = directory / fmt::format("flushed-{}.json", number);
+        const auto file = files->createForAppending(path);
+        if (!file && file.error().code == EEXIST) continue;
+        if (!file) throw failed(file.error());
+        if (const auto written = (*file)->append({body.text}); !written) throw failed(written.error());
+        return path;
+    }
+}
+
+void dump(const Options& options, const std::string& directory)
+{
+    Listener listener;
+    std::size_t bodies = 0;
+    std::string unsaved;
+    listener.onFlushedData = [&](const platform::Bytes& packed) {
+        ++bodies;
+        const FlushedBody body = flushedBody(packed);
+        showBody(options, body);
+        if (directory.empty() || body.text.empty()) return;
+        try {
+            const auto path = save(std::filesystem::absolute(directory).lexically_normal(), body);
+            if (!options.json) printLine(dim("  saved as " + path.string()));
+        } catch (const Failure& failure) { // the others are shown all the same
+            unsaved = failure.what();
+        }
+    };
+    Bridge bridge(options, listener);
+    work(options, bridge, listener, FlusherIntent::Dump);
+    if (bodies == 0 && !options.json)
+        printLine("Flushed; no body came here: there was none, or another tool watches the flushes.");
+    if (!unsaved.empty()) throw Failure(unsaved);
+}
+
+} // namespace
+
+void addFlusherCommands(CLI::App& app, Command& chosen)
+{
+    const auto countOf = [](CLI::App* command) {
+        auto count = std::make_shared<std::uint64_t>(0);
+        command->add_option("--count", *count, "End after so many; 0 is never")->capture_default_str();
+        return count;
+    };
+
+    CLI::App* watch = app.add_subcommand("watch", "Every event that clients report, live");
+    watch->footer(
+        "Says on standard error when it is attached. With --json each line is the event as the daemon tells it.\n"
+        "Ends with Ctrl-C, or after --count events.");
+    watch->callback([&chosen, count = countOf(watch)] {
+        chosen = [count](const Options& options) { watchEvents(options, *count); };
+    });
+
+    CLI::App* flush = app.add_subcommand("flush", "Uploads of feedback: watch, stop or force them");
+    flush->require_subcommand(1);
+    CLI::App* flushWatch = flush->add_subcommand("watch", "Every body that is flushed, live");
+    flushWatch->callback([&chosen, count = countOf(flushWatch)] {
+        chosen = [count](const Options& options) { watchFlushes(options, *count); };
+    });
+    flush->add_subcommand("stop", "Flush nothing in the background until the next dump")->callback([&chosen] {
+        chosen = stopFlushing;
+    });
+    CLI::App* flushDump = flush->add_subcommand("dump", "End all sessions, flush them now and show what is sent");
+    auto directory = std::make_shared<std::string>();
+    flushDump->add_option("-o,--output", *directory, "Directory in which to save the bodies as flushed-N.json");
+    flushDump->callback(
+        [&chosen, directory] { chosen = [directory](const Options& options) { dump(options, *directory); }; });
+}
+
+} // namespace tavrin::ctl

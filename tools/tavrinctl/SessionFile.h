@@ -1,0 +1,35 @@
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/Value.h"
+
+namespace tavrin::ctl {
+
+/// A session file, as far as it can be read: each record is its length, 8 bytes in the machine's order, and an archive.
+/// The first is the version of the daemon that wrote it, the second the session, each further one an event.
+struct SessionFile {
+    struct Event {
+        std::size_t offset = 0; ///< of the record in the file
+        std::size_t size = 0;   ///< of the record, its length field included
+        platform::Value value;  ///< a record of class "TavrinFeedback"
+    };
+    /// The first thing that can't be read. The daemon reads nothing from here on either.
+    struct Damage {
+        std::size_t offset = 0;
+        std::string reason;
+    };
+
+    std::optional<std::string> version;
+    platform::Value session; ///< a record of class "ClientSession"; null where there is none
+    std::vector<Event> events;
+    std::optional<Damage> damage;
+};
+
+[[nodiscard]] SessionFile readSessionFile(std::string_view bytes);
+
+} // namespace tavrin::ctl
