@@ -308,10 +308,6 @@ TEST(Record, DamagedArchivesNeverCrash)
     for (std::size_t bit = 0; bit < bytes.size() * 8; ++bit) {
         std::string damaged = bytes;
         damaged[bit / 8] = static_cast<char>(damaged[bit / 8] ^ 1 << (bit % 8));
-        if (const auto value = valueFromArchive(damaged)) {
-            const std::string again = archiveValue(*value);
-            EXPECT_EQ(archiveValue(valueFromArchive(again).value()), again) << "bit " << bit;
-        }
         if (const auto record = unarchive(damaged, classes())) {
             const std::string again = archive(**record);
             EXPECT_EQ(archive(*unarchive(again, classes()).value()), again) << "bit " << bit;
