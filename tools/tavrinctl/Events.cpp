@@ -80,12 +80,15 @@ std::string fieldsLine(const Dictionary& fields, std::initializer_list<std::stri
     return line;
 }
 
+std::string queryText(const Value& queryId)
+{
+    return queryId.asInt().value_or(0) == 0 ? std::string() : "query " + platform::toJson(queryId);
+}
+
 std::string eventLine(const Value& event)
 {
     if (!event.asDictionary()) return "no event: " + shortened(platform::toJson(event));
-    std::string query;
-    if (!event["query_id"].isNull()) query = "query " + platform::toJson(event["query_id"]);
-    return fmt::format("{:<24} {:<10} {}", textOr(event["type"], "no type"), query,
+    return fmt::format("{:<24} {:<10} {}", textOr(event["type"], "no type"), queryText(event["query_id"]),
                        fieldsLine(*event.asDictionary(), {"type", "timestamp", "query_id"}));
 }
 

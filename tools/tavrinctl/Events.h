@@ -15,6 +15,9 @@ namespace tavrin::ctl {
 [[nodiscard]] std::string fieldsLine(const platform::Dictionary& fields,
                                      std::initializer_list<std::string_view> leftOut);
 
+/// "query 7", or nothing for an event of no query.
+[[nodiscard]] std::string queryText(const platform::Value& queryId);
+
 /// An event object: its type, its query, then its other fields but for the time.
 [[nodiscard]] std::string eventLine(const platform::Value& event);
 

@@ -71,7 +71,7 @@ void send(const Options& options, const std::string& file)
     const std::vector<ReportedEvent> events = eventsInFile(file);
     const Session session = openSession(options);
     if (const auto bag = session.client->bag(); bag && bag->bag && !bag->bag->feedbackEnabled())
-        fmt::print(stderr, "tavrinctl: the bag has feedback switched off for {}: the daemon drops it\n", options.agent);
+        fmt::print(stderr, "tavrinctl: the bag has feedback switched off for {}: the daemon drops them\n", options.agent);
 
     std::size_t out = 0, taken = 0;
     std::string refusal;

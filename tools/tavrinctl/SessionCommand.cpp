@@ -56,11 +56,10 @@ void printEvents(const SessionFile& file)
     for (const SessionFile::Event& event : file.events) {
         const Value& record = event.value["feedback"];
         const std::string* className = record["class"].asString();
-        std::string fields =
-            fieldsLine(*event.value.asDictionary(), {"class", "feedback", "user_guid", "user_agent", "timestamp"});
-        if (record.asDictionary()) fields += " " + fieldsLine(*record.asDictionary(), {"class", "timestamp"});
-        printLine(fmt::format("{:>10} {:>8} {:>+9.3f} s  {:<32} {}", event.offset, event.size,
-                              timestampOf(event) - first, className ? printable(*className) : "no record", fields));
+        printLine(fmt::format("{:>10} {:>8} {:>+9.3f} s  {:<32} {:<10} {}", event.offset, event.size,
+                              timestampOf(event) - first, className ? printable(*className) : "no record",
+                              queryText(event.value["query_id"]),
+                              record.asDictionary() ? fieldsLine(*record.asDictionary(), {"class", "timestamp"}) : ""));
     }
 }
 

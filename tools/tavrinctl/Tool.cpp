@@ -36,8 +36,9 @@ std::string readFile(const std::string& path, std::size_t maximumSize)
 {
     std::error_code ignored;
     const auto found = std::filesystem::canonical(path, ignored);
-    auto bytes = platform::makeSystemFiles()->read(found.empty() ? std::filesystem::absolute(path) : found, maximumSize);
-    if (!bytes) throw Failure(fmt::format("{} can't be read: {}", path, bytes.error().reason()));
+    auto bytes =
+        platform::makeSystemFiles()->read(found.empty() ? std::filesystem::absolute(path) : found, maximumSize);
+    if (!bytes) throw Failure("can't read " + bytes.error().reason());
     return std::string(bytes->view());
 }
 
