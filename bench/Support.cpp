@@ -53,6 +53,7 @@ double median(std::vector<double> values)
 
 std::string seconds(double value)
 {
+    if (value < 1e-6) return fmt::format("{:.0f} ns", value * 1e9);
     if (value < 1e-3) return fmt::format("{:.1f} µs", value * 1e6);
     if (value < 1) return fmt::format("{:.2f} ms", value * 1e3);
     return fmt::format("{:.2f} s", value);

@@ -31,7 +31,7 @@ struct Row {
 [[nodiscard]] Row compare(std::string what, int rounds, double limit, const std::function<double()>& ours,
                           const std::function<double()>& beside);
 
-/// "12.3 µs", "4.5 ms".
+/// "123 ns", "12.3 µs", "4.5 ms".
 [[nodiscard]] std::string seconds(double value);
 
 /// Keeps this process and those that it starts on one core, until destroyed.
@@ -106,5 +106,6 @@ private:
 [[nodiscard]] std::vector<Row> memory();
 [[nodiscard]] std::vector<Row> waiters();
 [[nodiscard]] std::vector<Row> idle();
+[[nodiscard]] std::vector<Row> cacheTree();
 
 } // namespace tavrin::bench

@@ -16,7 +16,7 @@ int main(int argc, char** argv)
         std::string_view name;
         std::vector<Row> (*run)();
     } kBenchmarks[] = {{"ipc", ipc},       {"search", search},   {"start", startUp},
-                       {"memory", memory}, {"waiters", waiters}, {"idle", idle}};
+                       {"memory", memory}, {"waiters", waiters}, {"idle", idle},     {"tree", cacheTree}};
 
     const auto wanted = [&](std::string_view name) {
         for (int i = 1; i < argc; ++i)
@@ -30,7 +30,7 @@ int main(int argc, char** argv)
         for (Row& row : benchmark.run()) rows.push_back(std::move(row));
     }
     if (rows.empty()) {
-        std::fputs("usage: tavrin-bench [ipc] [search] [start] [memory] [waiters] [idle]\n", stderr);
+        std::fputs("usage: tavrin-bench [ipc] [search] [start] [memory] [waiters] [idle] [tree]\n", stderr);
         return 2;
     }
     std::puts("| What | Ours | Beside | Figure | At most |\n|---|---|---|---|---|");

@@ -1,0 +1,55 @@
+#pragma once
+
+#include <cstdint>
+#include <string_view>
+
+#include "tavrind/critbit.h"
+
+namespace tavrin {
+
+/// Objects under texts, in order of the texts' bytes; finds all texts that begin with a prefix. A text that holds a NUL
+/// can't be a key: it is never found and not stored.
+///
+/// The tree owns no object and releases none: whoever fills it keeps the objects alive until they can't be found any
+/// more. Not thread-safe.
+template <class Object> class CritbitTree {
+public:
+    CritbitTree()
+    {
+        _tree.release = [](void*) {};
+    }
+    ~CritbitTree() { removeAllObjects(); }
+    CritbitTree(const CritbitTree&) = delete;
+    CritbitTree& operator=(const CritbitTree&) = delete;
+
+    /// Stores the object in place of what is under the key. False: it is there already, or wasn't stored.
+    bool setObject(Object& object, std::string_view key) { return critbit_insert(_tree, key, pointer(object), 1) != 0; }
+    /// Null where there is none.
+    [[nodiscard]] Object* objectForKey(std::string_view key) const
+    {
+        void* object = nullptr;
+        critbit_contains(_tree, key, &object);
+        return static_cast<Object*>(object);
+    }
+    void removeObjectForKey(std::string_view key) { critbit_delete(_tree, key); }
+    void removeAllObjects() { critbit_clear(_tree); }
+    [[nodiscard]] std::uint64_t count() const { return _tree.count; }
+
+    /// Calls `block(std::string_view key, Object& object, bool& stop)` for each key that begins with the prefix, in
+    /// order, until it sets `stop`. The key is valid during the call only; the block must not change the tree.
+    template <class Block> void keysMatchingPrefix(std::string_view prefix, Block block) const
+    {
+        const auto callback = [](const char* key, void* context) {
+            bool stop = false;
+            (*static_cast<Block*>(context))(std::string_view(key), *static_cast<Object*>(critbit_value(key)), stop);
+            return stop ? 0 : 1;
+        };
+        critbit_allprefixed(_tree, prefix, callback, &block);
+    }
+
+private:
+    static void* pointer(Object& object) { return const_cast<void*>(static_cast<const void*>(&object)); }
+    critbit_tree _tree;
+};
+
+} // namespace tavrin
