@@ -1,6 +1,7 @@
 #include "tools/tavrinctl/Events.h"
 
 #include <algorithm>
+#include <span>
 
 #include <fmt/format.h>
 #include <fmt/ranges.h>
@@ -17,6 +18,7 @@ using platform::Value;
 namespace {
 
 constexpr std::size_t kLongestText = 60; // bytes
+constexpr std::size_t kMostTypes = 24;   // runs of one type
 
 /// The text, cut to so many bytes between two characters.
 std::string shortened(const std::string& text)
@@ -51,7 +53,7 @@ std::string fieldText(const std::string& name, const Value& value)
     }
 }
 
-/// "search_start, search_end ×3, error".
+/// "search_start, search_end ×3, error"; the first ones of many.
 std::string typesInOrder(const Value::Array& events)
 {
     std::vector<std::pair<std::string, std::size_t>> runs;
@@ -63,8 +65,9 @@ std::string typesInOrder(const Value::Array& events)
             runs.emplace_back(std::move(type), 1);
     }
     std::vector<std::string> texts;
-    for (const auto& [type, times] : runs) texts.push_back(times == 1 ? type : fmt::format("{} ×{}", type, times));
-    return fmt::format("{}", fmt::join(texts, ", "));
+    for (const auto& [type, times] : std::span(runs).first(std::min(runs.size(), kMostTypes)))
+        texts.push_back(times == 1 ? type : fmt::format("{} ×{}", type, times));
+    return fmt::format("{}{}", fmt::join(texts, ", "), runs.size() > kMostTypes ? ", …" : "");
 }
 
 } // namespace

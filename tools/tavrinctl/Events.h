@@ -30,8 +30,8 @@ struct FlushedBody {
 };
 [[nodiscard]] FlushedBody flushedBody(const platform::Bytes& packed);
 
-/// A session's agent, user, number of events and sizes, and on the next line its event types in their order; or the
-/// keys of a record that is sent on its own.
+/// A session's agent, user, number of events and sizes, and on the next line its first event types in their order; or
+/// the keys of a record that is sent on its own.
 [[nodiscard]] std::string summary(const FlushedBody& body);
 /// {"packed_size", "size", "body"}, or {"packed_size", "error"}.
 [[nodiscard]] platform::Value describe(const FlushedBody& body);
