@@ -1,3 +1,4 @@
+#include <algorithm>
 #include <array>
 #include <charconv>
 #include <cmath>
@@ -8,7 +9,7 @@
 #include <simdjson.h>
 
 #include "platform/Error.h"
-#include "platform/Value.h"
+#include "platform/JsonDocument.h"
 
 namespace platform {
 
@@ -18,63 +19,73 @@ namespace {
 
 namespace dom = simdjson::dom;
 
-/// A thread keeps its parser for documents up to this size; it needs some 15 bytes of memory for each of them.
+/// A thread keeps a parser for documents up to this size; it needs some 15 bytes of memory for each of them.
 constexpr std::size_t kKeptParserCapacity = 64u << 10;
+
+/// The parser that this thread has kept.
+thread_local std::unique_ptr<dom::parser> keptParser;
 
 std::unexpected<Error> malformed(std::string reason)
 {
     return std::unexpected(Error::withReason(std::string(kFormatErrorDomain), kFormatMalformed, std::move(reason)));
 }
 
-/// The parser of this thread, made when first needed.
-std::unique_ptr<dom::parser>& threadParser()
+/// Counts levels, unlike the parser, which leaves out containers that are empty.
+bool nestsDeeper(dom::element element, std::size_t levels)
 {
-    thread_local std::unique_ptr<dom::parser> parser;
-    if (!parser) parser = std::make_unique<dom::parser>();
-    return parser;
+    if (dom::array array; element.get(array) == simdjson::SUCCESS)
+        return levels == 0 ||
+               std::ranges::any_of(array, [levels](auto inner) { return nestsDeeper(inner, levels - 1); });
+    if (dom::object object; element.get(object) == simdjson::SUCCESS)
+        return levels == 0 ||
+               std::ranges::any_of(object, [levels](auto entry) { return nestsDeeper(entry.value, levels - 1); });
+    return false;
 }
 
-bool convert(dom::element element, std::size_t depth, Value& value);
-
-bool convertArray(dom::array array, std::size_t depth, Value& value)
+simdjson::error_code parseBounded(dom::parser& parser, std::string_view text, dom::element& root)
 {
-    if (depth > kMaximumDepth) return false;
+    // Documents of so few levels that an empty container is no level too many; nearly every one is.
+    if (parser.max_depth() != kMaximumDepth)
+        if (const auto error = parser.allocate(parser.capacity(), kMaximumDepth)) return error;
+    auto error = parser.parse(text.data(), text.size()).get(root);
+    if (error != simdjson::DEPTH_ERROR) return error;
+
+    error = parser.allocate(parser.capacity(), kMaximumDepth + 1);
+    if (!error) error = parser.parse(text.data(), text.size()).get(root);
+    return !error && nestsDeeper(root, kMaximumDepth) ? simdjson::DEPTH_ERROR : error;
+}
+
+Value convert(dom::element element);
+
+Value convertArray(dom::array array)
+{
     Value::Array elements;
     elements.reserve(array.size());
-    for (const dom::element element : array)
-        if (!convert(element, depth, elements.emplace_back())) return false;
-    value = std::move(elements);
-    return true;
+    for (const dom::element element : array) elements.push_back(convert(element));
+    return elements;
 }
 
-bool convertObject(dom::object object, std::size_t depth, Value& value)
+Value convertObject(dom::object object)
 {
-    if (depth > kMaximumDepth) return false;
     Dictionary entries;
     entries.reserve(object.size());
-    for (const auto& [key, element] : object) {
-        Value entry;
-        if (!convert(element, depth, entry)) return false;
-        entries.set(std::string(key), std::move(entry));
-    }
-    value = std::move(entries);
-    return true;
+    for (const auto& [key, element] : object) entries.set(std::string(key), convert(element));
+    return entries;
 }
 
-/// False if `element`, which lies `depth` containers deep, nests too deep.
-bool convert(dom::element element, std::size_t depth, Value& value)
+Value convert(dom::element element)
 {
     switch (element.type()) {
-    case dom::element_type::ARRAY: return convertArray(element.get_array().value_unsafe(), depth + 1, value);
-    case dom::element_type::OBJECT: return convertObject(element.get_object().value_unsafe(), depth + 1, value);
-    case dom::element_type::INT64: value = element.get_int64().value_unsafe(); break;
-    case dom::element_type::UINT64: value = element.get_uint64().value_unsafe(); break;
-    case dom::element_type::DOUBLE: value = element.get_double().value_unsafe(); break;
-    case dom::element_type::STRING: value = element.get_string().value_unsafe(); break;
-    case dom::element_type::BOOL: value = element.get_bool().value_unsafe(); break;
-    case dom::element_type::NULL_VALUE: value = nullptr; break;
+    case dom::element_type::ARRAY: return convertArray(element.get_array().value_unsafe());
+    case dom::element_type::OBJECT: return convertObject(element.get_object().value_unsafe());
+    case dom::element_type::INT64: return element.get_int64().value_unsafe();
+    case dom::element_type::UINT64: return element.get_uint64().value_unsafe();
+    case dom::element_type::DOUBLE: return element.get_double().value_unsafe();
+    case dom::element_type::STRING: return element.get_string().value_unsafe();
+    case dom::element_type::BOOL: return element.get_bool().value_unsafe();
+    case dom::element_type::NULL_VALUE: break;
     }
-    return true;
+    return {};
 }
 
 // Writing
@@ -263,20 +274,79 @@ private:
 
 } // namespace
 
-std::expected<Value, Error> parseJson(std::string_view text, std::size_t maximumSize)
+struct JsonDocument::Parsed {
+    std::unique_ptr<dom::parser> parser; ///< holds the document
+    dom::element root;
+
+    Parsed() : parser(keptParser ? std::move(keptParser) : std::make_unique<dom::parser>()) {}
+    ~Parsed()
+    {
+        if (parser->capacity() <= kKeptParserCapacity) keptParser = std::move(parser);
+    }
+    Parsed(const Parsed&) = delete;
+    Parsed& operator=(const Parsed&) = delete;
+
+    /// None where the document is no array.
+    [[nodiscard]] std::optional<dom::array> elements() const
+    {
+        dom::array array;
+        return root.get(array) == simdjson::SUCCESS ? std::optional(array) : std::nullopt;
+    }
+};
+
+JsonDocument::JsonDocument(std::unique_ptr<Parsed> parsed) : _parsed(std::move(parsed)) {}
+JsonDocument::JsonDocument(JsonDocument&&) noexcept = default;
+JsonDocument& JsonDocument::operator=(JsonDocument&&) noexcept = default;
+JsonDocument::~JsonDocument() = default;
+
+std::expected<JsonDocument, Error> JsonDocument::parse(std::string_view text, std::size_t maximumSize)
 {
     if (text.size() > maximumSize) return malformed(fmt::format("larger than {} bytes", maximumSize));
     if (text.starts_with("\xef\xbb\xbf")) text.remove_prefix(3);
 
-    auto& parser = threadParser();
-    dom::element root;
-    std::expected<Value, Error> result;
-    if (const auto error = parser->parse(text.data(), text.size()).get(root))
-        result = malformed(simdjson::error_message(error));
-    else if (!convert(root, 0, *result))
-        result = malformed(fmt::format("nested deeper than {}", kMaximumDepth));
-    if (parser->capacity() > kKeptParserCapacity) parser.reset();
-    return result;
+    auto parsed = std::make_unique<Parsed>();
+    const auto error = parseBounded(*parsed->parser, text, parsed->root);
+    if (error == simdjson::DEPTH_ERROR) return malformed(fmt::format("nested deeper than {}", kMaximumDepth));
+    if (error) return malformed(simdjson::error_message(error));
+    return JsonDocument(std::move(parsed));
+}
+
+Value JsonDocument::value() const
+{
+    return convert(_parsed->root);
+}
+
+std::size_t JsonDocument::count() const
+{
+    const auto elements = _parsed->elements();
+    return elements ? elements->size() : 0;
+}
+
+bool JsonDocument::anyElementHas(std::string_view key) const
+{
+    const auto elements = _parsed->elements();
+    return elements && std::ranges::any_of(*elements, [key](dom::element element) {
+               dom::object object;
+               return element.get(object) == simdjson::SUCCESS && !object.at_key(key).error();
+           });
+}
+
+Value JsonDocument::entryOfFirst(std::string_view key) const
+{
+    const auto elements = _parsed->elements();
+    dom::object object;
+    if (!elements || elements->at(0).get(object) != simdjson::SUCCESS) return {};
+    std::optional<dom::element> last; // of duplicate keys
+    for (const auto& [name, element] : object)
+        if (name == key) last = element;
+    return last ? convert(*last) : Value();
+}
+
+std::expected<Value, Error> parseJson(std::string_view text, std::size_t maximumSize)
+{
+    auto document = JsonDocument::parse(text, maximumSize);
+    if (!document) return std::unexpected(std::move(document.error()));
+    return document->value();
 }
 
 std::string toJson(const Value& value, JsonStyle style)

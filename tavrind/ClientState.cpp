@@ -40,6 +40,7 @@ const platform::Log& log()
 
 ClientState::ClientState(std::string identifier, Assembly& assembly)
     : _assembly(assembly), _identifier(std::move(identifier)), _clientShortName(shortName(_identifier)),
+      _answersQueue(assembly.device.serialQueue("com.quorvane.tavrind.answers")),
       _queue(assembly.device.serialQueue("com.quorvane.tavrind.clientState"))
 {
     if (assembly.userDefaults.boolean("TAVNoQueryCache")) {

@@ -12,6 +12,10 @@
 #include "platform/UrlSession.h"
 #include "platform/Uuid.h"
 
+namespace platform {
+class JsonDocument;
+}
+
 namespace tavrin {
 
 struct Assembly;
@@ -81,6 +85,8 @@ private:
     void _completed(ExchangePtr exchange, std::optional<platform::Bytes> data,
                     std::optional<platform::UrlResponse> response, std::optional<platform::Error> error,
                     const platform::Value& timingData);
+    void _useAnswer(const Exchange& exchange, const platform::JsonDocument& document);
+    [[nodiscard]] bool _mayCache(const platform::JsonDocument& answer, const Exchange& exchange) const;
     void _cacheResponse(const platform::Value& response, const Exchange& exchange);
     void _forceFetch(const platform::UrlResponse& response);
 
@@ -90,8 +96,8 @@ private:
     void recordSearchResult(int statusCode);
     void failSearchFeedback(const Exchange& exchange, const std::optional<platform::Error>& error,
                             std::size_t responseSize, int statusCode, const platform::Value& timingData);
-    void endNetworkFeedback(const Exchange& exchange, const platform::Value& rawResponse, std::size_t responseSize,
-                            int statusCode, const platform::Value& timingData);
+    void endNetworkFeedback(const Exchange& exchange, const platform::JsonDocument* rawResponse,
+                            std::size_t responseSize, int statusCode, const platform::Value& timingData);
     [[nodiscard]] platform::Uuid _currentUserGUID() const;
     void _setPerformedSearch();
     void _markNetworkRequest();
@@ -104,7 +110,8 @@ private:
     std::shared_ptr<TavrinUserGUIDController> _ownGuidController; // null: shared
     std::shared_ptr<ClientSessionManager> _ownSessionManager;
 
-    std::shared_ptr<platform::Queue> _queue; // guards all below
+    std::shared_ptr<platform::Queue> _answersQueue; // answers on their way into the cache
+    std::shared_ptr<platform::Queue> _queue;        // guards all below
     std::shared_ptr<TAVSessionConfiguration> _configuration;
     std::optional<std::string> _userAgent;
     std::shared_ptr<const TAVBag> _bag;

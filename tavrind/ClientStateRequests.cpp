@@ -14,6 +14,7 @@
 #include "CoreTavrin/TAVSessionConfiguration.h"
 #include "platform/Clock.h"
 #include "platform/Device.h"
+#include "platform/JsonDocument.h"
 #include "platform/Text.h"
 #include "searchrecords/ZRErrorFeedback.h"
 #include "searchrecords/ZRNetworkFeedback.h"
@@ -33,6 +34,7 @@ namespace tavrin {
 
 using platform::Bytes;
 using platform::Error;
+using platform::JsonDocument;
 using platform::UrlRequest;
 using platform::UrlResponse;
 using platform::Value;
@@ -251,8 +253,10 @@ void ClientState::flightLookup(std::shared_ptr<TAVRequest> request, RequestReply
 /// A set cached for a completion of what was typed. A query with items of its own always goes to the service.
 bool ClientState::_answerFromCache(Exchange& exchange)
 {
+    if (!_queryCache) return false;
+    _answersQueue->sync([] {}); // what was answered is in the cache
     const TAVRequest& query = *exchange.request;
-    const auto hit = _queryCache ? _queryCache->getRequest(query) : nullptr;
+    const auto hit = _queryCache->getRequest(query);
     if (!hit || !query.queryItems.empty()) return false;
 
     auto reply = std::make_shared<TAVReply>();
@@ -334,12 +338,12 @@ void ClientState::_completed(ExchangePtr exchange, std::optional<Bytes> data, st
         return failSearchFeedback(*exchange, error, responseSize, statusCode, timingData);
     }
 
-    auto decoded = platform::parseJson(data->view());
-    if (decoded) {
-        const bool preload = _queue->sync([this] { return !_configuration || !_configuration->dontPreloadImages; });
-        if (preload) _assembly.clientStateManager->processImagesFromResponse(*decoded, exchange->bag);
-        if (exchange->isSearch) _cacheResponse(*decoded, *exchange);
-    }
+    auto decoded = JsonDocument::parse(data->view());
+    const auto document = decoded ? std::make_shared<const JsonDocument>(std::move(*decoded)) : nullptr;
+    // The reply needs the text alone. What is to be cached is on its way there by then: whoever has the reply finds it.
+    const bool cached = document && _mayCache(*document, *exchange);
+    const auto useAnswer = [self = shared_from_this(), exchange, document] { self->_useAnswer(*exchange, *document); };
+    if (cached) _answersQueue->async(useAnswer);
 
     auto reply = std::make_shared<TAVReply>();
     reply->scale = query.scale;
@@ -347,12 +351,24 @@ void ClientState::_completed(ExchangePtr exchange, std::optional<Bytes> data, st
         reply->httpRequest = record(exchange->httpRequest);
         reply->httpResponse = record(*response);
     }
-    if (decoded) reply->rawResponse = *data;
+    if (document) reply->rawResponse = *data;
     reply->geoSessionEntityString = _assembly.requestFactory->getMapsUserSessionEntity();
-    exchange->answer(std::move(reply), decoded ? OptionalError() : decoded.error());
+    exchange->answer(std::move(reply), document ? OptionalError() : decoded.error());
 
-    endNetworkFeedback(*exchange, decoded ? *decoded : Value(), responseSize, statusCode, timingData);
+    if (document && !cached) _assembly.device.globalQueue(platform::Priority::Default)->async(useAnswer);
+    endNetworkFeedback(*exchange, document.get(), responseSize, statusCode, timingData);
     _forceFetch(*response);
+}
+
+/// What is made of an answer besides the reply: images are fetched, result sets cached.
+void ClientState::_useAnswer(const Exchange& exchange, const JsonDocument& document)
+{
+    const bool preload = _queue->sync([this] { return !_configuration || !_configuration->dontPreloadImages; });
+    const bool cached = _mayCache(document, exchange);
+    if (!preload && !cached) return;
+    const Value response = document.value();
+    if (preload) _assembly.clientStateManager->processImagesFromResponse(response, exchange.bag);
+    if (cached) _cacheResponse(response, exchange);
 }
 
 void ClientState::_forceFetch(const UrlResponse& response)
@@ -366,11 +382,15 @@ void ClientState::_forceFetch(const UrlResponse& response)
         .error("Failed to deserialize X-Quorvane-ForceFetch header data into a dictionary: {}", *header);
 }
 
+/// True if some result set names the query that it completes, without which none is cached.
+bool ClientState::_mayCache(const JsonDocument& answer, const Exchange& exchange) const
+{
+    return exchange.isSearch && _queryCache && !exchange.request->queryString.empty() && answer.anyElementHas("query");
+}
+
 void ClientState::_cacheResponse(const Value& response, const Exchange& exchange)
 {
-    const Value::Array* sets = response.asArray();
-    if (!_queryCache || !sets || exchange.request->queryString.empty()) return;
-    for (const Value& set : *sets) {
+    for (const Value& set : *response.asArray()) {
         if (!set.asDictionary()) continue;
         const std::string* status = set["status"].asString();
         if (status && *status == "ERROR") continue;
@@ -414,15 +434,15 @@ void ClientState::failSearchFeedback(const Exchange& exchange, const std::option
                  query.queryId, query.clientQueryId);
 }
 
-void ClientState::endNetworkFeedback(const Exchange& exchange, const Value& rawResponse, std::size_t responseSize,
-                                     int statusCode, const Value& timingData)
+void ClientState::endNetworkFeedback(const Exchange& exchange, const JsonDocument* rawResponse,
+                                     std::size_t responseSize, int statusCode, const Value& timingData)
 {
     std::shared_ptr<ZRFeedback> record;
-    if (rawResponse.asArray() && rawResponse.count() > 0) {
-        const Value& first = rawResponse[0];
+    if (rawResponse && rawResponse->count() > 0) {
+        const auto first = [rawResponse](std::string_view key) { return rawResponse->entryOfFirst(key); };
         record = std::make_shared<TAVEndNetworkSearchFeedback>(
-            exchange.start, responseSize, statusCode, textIn(first["status"]), first["duration"].asDouble().value_or(0),
-            textIn(first["fbq"]), textIn(first["partial_client_ip"]), timingData);
+            exchange.start, responseSize, statusCode, textIn(first("status")), first("duration").asDouble().value_or(0),
+            textIn(first("fbq")), textIn(first("partial_client_ip")), timingData);
     } else {
         record = std::make_shared<ZREndNetworkSearchFeedback>(exchange.start, responseSize, statusCode, timingData);
     }

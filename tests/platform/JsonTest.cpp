@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include "platform/Error.h"
+#include "platform/JsonDocument.h"
 #include "platform/Value.h"
 
 namespace platform {
@@ -79,12 +80,50 @@ TEST(Json, RefusesWhatIsNotJsonWithAReason)
 
 TEST(Json, BoundsDepthAndSize)
 {
-    EXPECT_TRUE(parseJson(arrays(kMaximumDepth)));
-    EXPECT_FALSE(parseJson(arrays(kMaximumDepth + 1)));
+    for (const std::string_view innermost : {"", "1", "{}", R"({"a":1})", R"(1,{"a":[]})"}) {
+        const std::size_t levels = kMaximumDepth - innermost.contains('{') - innermost.contains('[');
+        const auto nested = [&](std::size_t depth) {
+            return std::string(depth, '[').append(innermost) + std::string(depth, ']');
+        };
+        EXPECT_TRUE(parseJson(nested(levels))) << innermost;
+        const auto deeper = parseJson(nested(levels + 1));
+        ASSERT_FALSE(deeper) << innermost;
+        EXPECT_TRUE(deeper.error().reason().starts_with("nested deeper")) << deeper.error().reason();
+        EXPECT_TRUE(parseJson(nested(levels))) << "after one that was refused";
+    }
     EXPECT_FALSE(parseJson(arrays(1'000'000)));
     EXPECT_FALSE(parseJson(std::string(1'000'000, '[')));
     EXPECT_TRUE(parseJson("[10]", 4));
     EXPECT_FALSE(parseJson("[100]", 4));
+}
+
+TEST(Json, DocumentsAnswerFromTheirPlace)
+{
+    struct {
+        std::string_view text;
+        std::size_t count;
+        bool anyHasA;
+        Value firstA;
+    } const cases[] = {
+        {"[]", 0, false, nullptr},
+        {R"({"a":1})", 0, false, nullptr},
+        {R"("a")", 0, false, nullptr},
+        {R"([["a"],"a"])", 2, false, nullptr},
+        {R"([{"b":{"a":1}}])", 1, false, nullptr},
+        {R"([null,{"b":1,"a":2}])", 2, true, nullptr},
+        {R"([{"a":[1,{"b":0.5}]},{"a":3}])", 2, true, Value::Array{1, Dictionary{{"b", 0.5}}}},
+        {R"([{"a":1,"b":2,"a":3}])", 1, true, 3},
+    };
+    for (const auto& c : cases) {
+        std::string text(c.text);
+        const auto document = JsonDocument::parse(text);
+        ASSERT_TRUE(document) << c.text;
+        text.assign(text.size(), '!'); // it isn't needed any more
+        EXPECT_EQ(document->count(), c.count) << c.text;
+        EXPECT_EQ(document->anyElementHas("a"), c.anyHasA) << c.text;
+        EXPECT_EQ(document->entryOfFirst("a"), c.firstA) << c.text;
+        EXPECT_EQ(document->value(), parseJson(c.text).value()) << "another document at the same time";
+    }
 }
 
 TEST(Json, KeepsNothingOfALargeDocumentForTheNextOne)

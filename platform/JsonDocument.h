@@ -1,0 +1,37 @@
+#pragma once
+
+#include <expected>
+#include <memory>
+#include <string_view>
+
+#include "platform/Value.h"
+
+namespace platform {
+
+/// A JSON document that was read, and from which values are made where they are wanted: reading takes a fifth of the
+/// time that making all of its values does. It doesn't need the text any more. Immutable, hence any thread.
+class JsonDocument {
+public:
+    /// As `parseJson` does.
+    [[nodiscard]] static std::expected<JsonDocument, Error> parse(std::string_view text,
+                                                                  std::size_t maximumSize = 64u << 20);
+    JsonDocument(JsonDocument&&) noexcept;
+    JsonDocument& operator=(JsonDocument&&) noexcept;
+    ~JsonDocument();
+
+    /// The whole document.
+    [[nodiscard]] Value value() const;
+    /// Elements of a document that is an array; 0 for any other.
+    [[nodiscard]] std::size_t count() const;
+    /// True if a dictionary among the array's elements has an entry `key`.
+    [[nodiscard]] bool anyElementHas(std::string_view key) const;
+    /// The entry `key` of the dictionary that is the array's first element; the null value where there is none.
+    [[nodiscard]] Value entryOfFirst(std::string_view key) const;
+
+private:
+    struct Parsed;
+    explicit JsonDocument(std::unique_ptr<Parsed> parsed);
+    std::unique_ptr<Parsed> _parsed;
+};
+
+} // namespace platform
