@@ -51,7 +51,7 @@ TEST_F(UploadTest, WhatTheServiceGets)
         << "the bag's own query is replaced";
     EXPECT_EQ(request.url.queryValue("v"), "2");
     EXPECT_EQ(request.timeout, platform::Duration(300s));
-    const auto text = devserver::inflateRaw(task->body, 1u << 20).value();
+    const auto text = tools::inflateRaw(task->body, 1u << 20).value();
     ASSERT_TRUE(request.headers.find("X-Quorvane-Digest"));
     EXPECT_EQ(*request.headers.find("X-Quorvane-Digest"), sha512(text));
 
@@ -403,7 +403,7 @@ TEST_F(BridgeTest, DumpEndsSessionsAndShowsTheBodies)
     ASSERT_EQ(pushes.size(), 2u);
     EXPECT_EQ(pushes[0].signal, "FlushedData");
     EXPECT_EQ(pushes[1].signal, "WorkDone");
-    const auto body = devserver::inflateRaw(pushes[0].message.args[0].asBytes()->view(), 1u << 20);
+    const auto body = tools::inflateRaw(pushes[0].message.args[0].asBytes()->view(), 1u << 20);
     EXPECT_EQ(typesIn(platform::parseJson(*body).value()), (Types{"search_view_appear", "session_end"}));
     EXPECT_EQ(uploads().size(), 1u) << "it is uploaded, too";
     EXPECT_FALSE(assembly().backgroundFlusher->stopFlushing());
@@ -443,7 +443,7 @@ TEST(CompressedOutputStreamTest, RoundTripAndDigest)
         stream.close();
         EXPECT_EQ(stream.streamStatus(), StreamStatus::Closed);
         const auto& packed = static_cast<const MemoryOutputStream&>(stream.outputStream()).contents();
-        EXPECT_EQ(devserver::inflateRaw(packed, 1u << 20).value(), text);
+        EXPECT_EQ(tools::inflateRaw(packed, 1u << 20).value(), text);
         EXPECT_EQ(stream.dataDigestForStream(), sha512(text));
     }
 }

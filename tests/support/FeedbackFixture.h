@@ -8,7 +8,7 @@
 #include "tavrind/FileContainer.h"
 #include "tavrind/TavrinPersistentStorage.h"
 #include "tests/support/DaemonFixture.h"
-#include "tools/devserver/Compression.h"
+#include "tools/shared/Inflate.h"
 
 namespace tavrin::test {
 
@@ -72,7 +72,7 @@ struct FeedbackTest : DaemonTest {
     /// An upload's JSON.
     static Value decoded(const UploadTask& task)
     {
-        const auto text = devserver::inflateRaw(task.body, 64u << 20);
+        const auto text = tools::inflateRaw(task.body, 64u << 20);
         return text ? platform::parseJson(*text).value_or(Value()) : Value();
     }
     /// The types of an upload's events, in order.
