@@ -70,6 +70,28 @@ bool writeAll(int fd, std::string_view contents)
     return true;
 }
 
+bool copyAll(int from, int to)
+{
+    std::array<char, 64 * 1024> chunk;
+    while (true) {
+        const ssize_t count = retried([&] { return read(from, chunk.data(), chunk.size()); });
+        if (count <= 0) return count == 0;
+        if (!writeAll(to, {chunk.data(), static_cast<std::size_t>(count)})) return false;
+    }
+}
+
+FileInfo infoOf(const struct statx& status)
+{
+    FileInfo info;
+    info.kind = S_ISREG(status.stx_mode)   ? FileInfo::Kind::File
+                : S_ISDIR(status.stx_mode) ? FileInfo::Kind::Directory
+                                           : FileInfo::Kind::Other;
+    info.size = status.stx_size;
+    info.modified = dateOf(status.stx_mtime);
+    info.created = status.stx_mask & STATX_BTIME ? dateOf(status.stx_btime) : info.modified;
+    return info;
+}
+
 /// Makes what was renamed in a directory outlive a power cut.
 void syncDirectory(const fs::path& directory)
 {
@@ -139,18 +161,22 @@ public:
 
     Result<void> writeAtomically(const fs::path& path, std::string_view contents) override
     {
-        const fs::path temporary = path.string() + "." + Uuid::random().string().substr(0, 8) + ".tmp";
-        FileHandle file(retried([&] {
-            return open(temporary.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
-        }));
-        if (!file) return failure(path);
-        if (writeAll(file.fd(), contents) && fsync(file.fd()) == 0 && rename(temporary.c_str(), path.c_str()) == 0) {
+        return publish(path, [&](int fd) { return writeAll(fd, contents); });
+    }
+
+    Result<void> replace(const fs::path& path, const fs::path& source) override
+    {
+        auto file = openForReading(source);
+        if (!file) return std::unexpected(std::move(file.error()));
+        if (fchmod(file->fd(), 0600) != 0 || fsync(file->fd()) != 0) return failure(source);
+        if (rename(source.c_str(), path.c_str()) == 0) {
             syncDirectory(path.parent_path());
             return {};
         }
-        auto error = failure(path);
-        unlink(temporary.c_str());
-        return error;
+        if (errno != EXDEV) return failure(path);
+        auto published = publish(path, [&](int fd) { return copyAll(file->fd(), fd); });
+        if (published) unlink(source.c_str());
+        return published;
     }
 
     Result<void> createDirectories(const fs::path& path) override
@@ -172,14 +198,7 @@ public:
         struct statx status {};
         if (statx(AT_FDCWD, path.c_str(), AT_SYMLINK_NOFOLLOW, STATX_BASIC_STATS | STATX_BTIME, &status) != 0)
             return failure(path);
-        FileInfo info;
-        info.kind = S_ISREG(status.stx_mode)   ? FileInfo::Kind::File
-                    : S_ISDIR(status.stx_mode) ? FileInfo::Kind::Directory
-                                               : FileInfo::Kind::Other;
-        info.size = status.stx_size;
-        info.modified = dateOf(status.stx_mtime);
-        info.created = status.stx_mask & STATX_BTIME ? dateOf(status.stx_btime) : info.modified;
-        return info;
+        return infoOf(status);
     }
 
     Result<void> remove(const fs::path& path) override
@@ -218,6 +237,24 @@ public:
         if (!file) return failure(path);
         return std::make_unique<SystemAppendFile>(std::move(file));
     }
+
+private:
+    /// Writes a temporary file beside `path` with `fill`, and makes it `path`.
+    template <class Fill> static Result<void> publish(const fs::path& path, Fill fill)
+    {
+        const fs::path temporary = path.string() + "." + Uuid::random().string().substr(0, 8) + ".tmp";
+        FileHandle file(retried([&] {
+            return open(temporary.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
+        }));
+        if (!file) return failure(path);
+        if (fill(file.fd()) && fsync(file.fd()) == 0 && rename(temporary.c_str(), path.c_str()) == 0) {
+            syncDirectory(path.parent_path());
+            return {};
+        }
+        auto error = failure(path);
+        unlink(temporary.c_str());
+        return error;
+    }
 };
 
 fs::path fromEnvironmentOr(const char* variable, const fs::path& fallback)
@@ -246,6 +283,14 @@ fs::path home()
 }
 
 } // namespace
+
+Result<FileInfo> fileInfo(const FileHandle& file)
+{
+    struct statx status {};
+    if (statx(file.fd(), "", AT_EMPTY_PATH, STATX_BASIC_STATS | STATX_BTIME, &status) != 0)
+        return std::unexpected(Error::posix(errno));
+    return infoOf(status);
+}
 
 std::unique_ptr<FileSystem> makeSystemFiles()
 {

@@ -64,6 +64,10 @@ public:
     /// Publishes a file whole: writes a temporary beside it, syncs, renames it over `path`, syncs the directory.
     /// A failure leaves the old file as it was. Mode 0600.
     [[nodiscard]] virtual Result<void> writeAtomically(const std::filesystem::path& path, std::string_view contents) = 0;
+    /// Publishes the file `source` as `path`, in one step: it is synced and renamed, or, on another file system, copied
+    /// beside `path` first. Who has the old file open keeps reading that. A failure leaves the old file as it was;
+    /// `source` is gone only after a success. Mode 0600.
+    [[nodiscard]] virtual Result<void> replace(const std::filesystem::path& path, const std::filesystem::path& source) = 0;
     /// Makes the directory and its parents, those made with mode 0700. One that is there already is fine.
     [[nodiscard]] virtual Result<void> createDirectories(const std::filesystem::path& path) = 0;
     [[nodiscard]] virtual Result<FileInfo> info(const std::filesystem::path& path) = 0;
@@ -77,6 +81,9 @@ public:
 };
 
 [[nodiscard]] std::unique_ptr<FileSystem> makeSystemFiles();
+
+/// About an open file. Any thread.
+[[nodiscard]] Result<FileInfo> fileInfo(const FileHandle& file);
 
 /// The user's directories. Made on first use by whoever writes there, never at start-up.
 struct Directories {

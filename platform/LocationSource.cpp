@@ -18,4 +18,16 @@ Location fuzz(double latitude, double longitude, std::string source)
     return {.latitude = row, .longitude = std::clamp(column, -180.0, 180.0), .source = std::move(source)};
 }
 
+bool isSignificantMove(const Location& from, const Location& to)
+{
+    constexpr double kEarthRadius = 6371; // km
+    constexpr double kSignificant = 10;   // km
+    constexpr double kRadians = std::numbers::pi / 180;
+    // Haversine: exact enough close by, where it matters, and sound everywhere.
+    const double rows = std::sin((to.latitude - from.latitude) * kRadians / 2);
+    const double columns = std::sin((to.longitude - from.longitude) * kRadians / 2);
+    const double a = rows * rows + std::cos(from.latitude * kRadians) * std::cos(to.latitude * kRadians) * columns * columns;
+    return 2 * kEarthRadius * std::asin(std::min(1.0, std::sqrt(a))) >= kSignificant;
+}
+
 } // namespace platform

@@ -23,6 +23,9 @@ struct Location {
 /// longitude. Nobody above this layer sees a finer place.
 [[nodiscard]] Location fuzz(double latitude, double longitude, std::string source);
 
+/// Whether two places are 10 km or more apart: what is of interest at one may not be at the other.
+[[nodiscard]] bool isSignificantMove(const Location& from, const Location& to);
+
 /// Where the device is, as coarsely as `fuzz` makes it. Any thread.
 class LocationSource {
 public:

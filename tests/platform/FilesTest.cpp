@@ -141,6 +141,38 @@ TEST_F(FilesTest, AppendsWholeRecordsOrNothing)
     EXPECT_EQ(contents(directory / "records"), "head" + kilobyte + "tailb") << "the half-written record is cut off";
 }
 
+TEST_F(FilesTest, AReplacedFileIsTheOldOrTheNewAlsoAcrossFileSystems)
+{
+    const test::TemporaryDirectory memory("/dev/shm");
+    struct stat here {}, there {};
+    ASSERT_EQ(stat(directory.path.c_str(), &here) | stat(memory.path.c_str(), &there), 0);
+    if (here.st_dev == there.st_dev) GTEST_SKIP() << "there is one file system only";
+    for (const fs::path& source : {directory / "source", memory / "source"}) {
+        writeFile(directory / "file", "old");
+        writeFile(source, std::string(200'000, 'n'));
+        chmod(source.c_str(), 0644);
+        const auto reader = files->openForReading(directory / "file");
+        EXPECT_TRUE(files->replace(directory / "file", source));
+        std::array<char, 8> buffer{};
+        EXPECT_EQ(read(reader->fd(), buffer.data(), buffer.size()), 3);
+        EXPECT_EQ(contents(directory / "file"), std::string(200'000, 'n'));
+        EXPECT_EQ(mode(directory / "file"), 0600u);
+        EXPECT_FALSE(fs::exists(source));
+    }
+
+    writeFile(memory / "source", std::string(10'000, 'x'));
+    fs::create_directory(directory / "directory");
+    fs::create_symlink(memory / "source", memory / "link");
+    const auto full = onFullDisk(4096, [&] { return files->replace(directory / "file", memory / "source"); });
+    EXPECT_EQ(failure(full), EFBIG);
+    EXPECT_EQ(failure(files->replace(directory / "directory", memory / "source")), EISDIR);
+    EXPECT_EQ(failure(files->replace(directory / "file", memory / "none")), ENOENT);
+    EXPECT_EQ(failure(files->replace(directory / "file", memory / "link")), ELOOP);
+    EXPECT_EQ(contents(directory / "file"), std::string(200'000, 'n'));
+    EXPECT_TRUE(fs::exists(memory / "source"));
+    EXPECT_EQ(files->list(directory.path)->size(), 2u) << "no temporary files are left";
+}
+
 TEST_F(FilesTest, TellsWhatThereIs)
 {
     writeFile(directory / "file", "1234");

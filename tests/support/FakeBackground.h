@@ -35,6 +35,21 @@ public:
         {
             finish(UrlResponse{_request.url, true, status, std::move(headers)}, std::nullopt);
         }
+        /// Ends a download with an answer, from where redirects led.
+        void deliver(int status, std::string contents, std::optional<Url> from = {})
+        {
+            if (std::exchange(finished, true)) return;
+            _queue->async([self = shared_from_this(), contents = std::move(contents),
+                           response = UrlResponse{from.value_or(_request.url), true, status, {}}] {
+                const auto delegate = self->_delegate.lock();
+                if (!delegate) return;
+                const std::filesystem::path file = "/tmp/download-" + std::to_string(self->_identifier);
+                self->_files->files[file] = contents;
+                delegate->taskDidFinishDownloading(self, file, response);
+                self->_files->files.erase(file);
+                delegate->taskDidComplete(self, response, std::nullopt);
+            });
+        }
         void fail(Error error) { finish(std::nullopt, std::move(error)); }
 
         bool upload = true;
@@ -57,6 +72,7 @@ public:
         Value _note;
         std::weak_ptr<BackgroundSessionDelegate> _delegate;
         std::shared_ptr<Queue> _queue;
+        MemoryFiles* _files = nullptr;
     };
 
     class Session final : public BackgroundSession {
@@ -84,6 +100,13 @@ public:
             callback(std::move(running));
         }
 
+        /// Takes up a task of an earlier process.
+        void adopt(Task& task)
+        {
+            task._delegate = _delegate;
+            task._queue = _queue;
+        }
+
         BackgroundSessionConfiguration configuration;
         std::vector<std::shared_ptr<Task>> tasks;
         bool refuse = false; ///< makes no uploads
@@ -97,6 +120,7 @@ public:
             task->_request = std::move(request);
             task->_delegate = _delegate;
             task->_queue = _queue;
+            task->_files = _files;
             tasks.push_back(task);
             return task;
         }

@@ -33,6 +33,17 @@ Result<void> MemoryFiles::writeAtomically(const fs::path& path, std::string_view
     return {};
 }
 
+Result<void> MemoryFiles::replace(const fs::path& path, const fs::path& source)
+{
+    std::lock_guard lock(_mutex);
+    if (const int error = faultOf("replace", path)) return std::unexpected(Error::posix(error));
+    if (!files.contains(source) || !directories.contains(path.parent_path()))
+        return std::unexpected(Error::posix(ENOENT));
+    if (directories.contains(path)) return std::unexpected(Error::posix(EISDIR));
+    files[path] = files.extract(source).mapped();
+    return {};
+}
+
 Result<void> MemoryFiles::createDirectories(const fs::path& path)
 {
     std::lock_guard lock(_mutex);

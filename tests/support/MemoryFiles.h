@@ -12,7 +12,7 @@ namespace platform::test {
 /// Files in memory. An operation fails when the test says so.
 class MemoryFiles final : public FileSystem {
 public:
-    /// Asked before every operation ("read", "write", "mkdir", "info", "remove", "list", "create", "append") with its path; a
+    /// Asked before every operation ("read", "write", "replace", "mkdir", "info", "remove", "list", "create", "append") with its path; a
     /// number other than 0 is the errno that it fails with.
     std::function<int(std::string_view operation, const std::filesystem::path& path)> fault;
 
@@ -22,6 +22,7 @@ public:
 
     Result<Bytes> read(const std::filesystem::path& path, std::size_t maximumSize) override;
     Result<void> writeAtomically(const std::filesystem::path& path, std::string_view contents) override;
+    Result<void> replace(const std::filesystem::path& path, const std::filesystem::path& source) override;
     Result<void> createDirectories(const std::filesystem::path& path) override;
     Result<FileInfo> info(const std::filesystem::path& path) override;
     Result<void> remove(const std::filesystem::path& path) override;
