@@ -6,8 +6,8 @@
 #include "tavrind/TavrinDiagnosticDataReporter.h"
 
 namespace platform {
-struct Device;
 class BackgroundSession;
+struct Device;
 class FileSystem;
 class NotificationCenter;
 class UrlSession;
@@ -47,8 +47,8 @@ struct Assembly {
 
     std::shared_ptr<platform::UrlSession> urlSession;         ///< foreground: every request of a client
     std::shared_ptr<platform::UrlSession> bagSession;         ///< without caching
-    std::shared_ptr<platform::UrlSession> downloadURLSession; ///< resources
-    std::shared_ptr<platform::BackgroundSession> uploadURLSession; ///< feedback
+    std::shared_ptr<platform::BackgroundSession> downloadURLSession; ///< resources
+    std::shared_ptr<platform::BackgroundSession> uploadURLSession;   ///< feedback
     platform::UserDefaults& userDefaults;
     platform::FileSystem& fileManager;
     platform::NotificationCenter& notificationCenter;

@@ -1,12 +1,348 @@
 #include "tavrind/DownloadManager.h"
 
+#include <cerrno>
+#include <vector>
+
+#include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVError.h"
+#include "platform/Device.h"
+#include "platform/UserDefaults.h"
+#include "tavrind/Assembly.h"
+#include "tavrind/TAVNetworkRequestFactory.h"
+#include "tavrind/TavrinBagController.h"
+#include "tavrind/TavrinLogging.h"
 
 namespace tavrin {
 
+using platform::Url;
+using platform::UrlRequest;
+using platform::UrlResponse;
+using platform::Value;
+
+namespace fs = std::filesystem;
+
+namespace {
+
+using namespace std::chrono_literals;
+
+constexpr const char* kTableKey = "download_resources";
+constexpr const char* kIdentifierHeader = "X-Quorvane-Download-Identifier";
+constexpr const char* kDirectory = "com.quorvane.tavrind";
+constexpr platform::Duration kDelay = 60s;
+constexpr platform::Duration kTaskListTimeout = 5s;
+
+const platform::Log& log()
+{
+    return TavrinLogForCategory(kLogDownloadManager);
+}
+
+std::string identifierOf(const UrlRequest& request)
+{
+    const std::string* identifier = request.headers.find(kIdentifierHeader);
+    return identifier && isResource(*identifier) ? *identifier : std::string();
+}
+
+std::string textOf(const platform::HttpHeaders& headers)
+{
+    std::string text;
+    for (const auto& [name, value] : headers) text += fmt::format("{}{}: {}", text.empty() ? "" : "; ", name, value);
+    return text;
+}
+
+/// The list of a session's tasks, on its way.
+struct TaskList {
+    platform::Event arrived;
+    std::vector<std::shared_ptr<platform::BackgroundTask>> tasks; // once it has
+};
+
+} // namespace
+
+std::shared_ptr<DownloadManager> DownloadManager::make(Assembly& assembly)
+{
+    auto manager = std::make_shared<DownloadManager>(assembly);
+    const std::weak_ptr weak = manager;
+    manager->_bagObserver = assembly.notificationCenter.observe(
+        TAVBagChangeNotification, [weak](const platform::Notification& notification) {
+            const auto bag = notification.get<std::shared_ptr<const TAVBag>>("bag");
+            const auto self = weak.lock();
+            if (self && bag) self->bagChangeNotification(bag);
+        });
+    manager->_locationObserver =
+        assembly.notificationCenter.observe(TAVSignificantLocationChange, [weak](const platform::Notification&) {
+            if (const auto self = weak.lock()) self->_handleSignificantLocationChange();
+        });
+    return manager;
+}
+
+DownloadManager::DownloadManager(Assembly& assembly)
+    : _assembly(assembly),
+      _queue(assembly.device.serialQueue("com.quorvane.tavrin.DownloadManager", platform::Priority::Background))
+{}
+
+DownloadManager::~DownloadManager() = default;
+
+void DownloadManager::setLookupResources(std::weak_ptr<LookupResources> lookupResources)
+{
+    _queue->sync([&] { _lookupResources = std::move(lookupResources); });
+}
+
+std::optional<DownloadResource> DownloadManager::resourceForKey(const std::string& identifier)
+{
+    _start();
+    return _queue->sync([&]() -> std::optional<DownloadResource> {
+        const auto found = _resources.find(identifier);
+        return found == _resources.end() ? std::nullopt : std::optional(found->second);
+    });
+}
+
+platform::Dictionary DownloadManager::resourceVersions()
+{
+    _start();
+    return _queue->sync([this] {
+        platform::Dictionary versions;
+        for (const auto& [identifier, resource] : _resources)
+            if (std::string version = _resourceVersion(resource); !version.empty())
+                versions.set(identifier, std::move(version));
+        return versions;
+    });
+}
+
 platform::Result<DownloadManager::Resource> DownloadManager::fileHandleForResource(const std::string& identifier) const
 {
-    return std::unexpected(makeTAVError(TAVErrorNotFound, "no resource " + identifier));
+    const auto path = _pathToResource(identifier);
+    if (!path) return std::unexpected(path.error());
+    auto file = _assembly.fileManager.openForReading(*path);
+    if (!file && file.error().code == ENOENT)
+        return std::unexpected(makeTAVError(TAVErrorNotFound, "no resource " + identifier));
+    if (!file) return std::unexpected(makeTAVError(TAVErrorInvalidResponse, file.error().description()));
+    const auto info = platform::fileInfo(*file);
+    if (!info) return std::unexpected(makeTAVError(TAVErrorInvalidResponse, info.error().description()));
+    return Resource{
+        std::move(*file),
+        Value::dictionaryOf({{"size", info->size}, {"modified", info->modified}, {"created", info->created}})};
+}
+
+void DownloadManager::bagChangeNotification(const std::shared_ptr<const TAVBag>& bag)
+{
+    log().log("bag change: {}", bag->version());
+    _start();
+    _queue->async([weak = weak_from_this(), bag] {
+        if (const auto self = weak.lock()) self->_downloadBagResources(bag);
+    });
+}
+
+void DownloadManager::_handleSignificantLocationChange()
+{
+    _start();
+    _queue->async([weak = weak_from_this()] {
+        const auto self = weak.lock();
+        if (!self) return;
+        for (const std::string_view identifier : {kTAVLookupHintsWeekly, kTAVLookupHintsMonthly})
+            self->_deleteResource(std::string(identifier), File::Keep);
+        self->_saveResources();
+    });
+}
+
+void DownloadManager::_start()
+{
+    if (_started.exchange(true)) return;
+    log().log("started");
+    _queue->async([weak = weak_from_this()] {
+        if (const auto self = weak.lock()) self->_loadResources();
+    });
+}
+
+void DownloadManager::_loadResources()
+{
+    _resources = resourcesIn(_assembly.userDefaults.value(kTableKey));
+}
+
+void DownloadManager::_saveResources()
+{
+    Value table = valueOf(_resources);
+    if (_assembly.userDefaults.value(kTableKey) != table) _assembly.userDefaults.set(kTableKey, std::move(table));
+}
+
+void DownloadManager::_downloadBagResources(const std::shared_ptr<const TAVBag>& bag)
+{
+    _queue->assertOnQueue();
+    const auto list = std::make_shared<TaskList>();
+    _assembly.downloadURLSession->getTasks([list](auto tasks) {
+        list->tasks = std::move(tasks);
+        list->arrived.signal();
+    });
+    _queue->suspendUntil(list->arrived, kTaskListTimeout, [weak = weak_from_this(), list, bag] {
+        const auto self = weak.lock();
+        if (!self) return;
+        if (list->arrived.signalled()) {
+            for (const auto& task : list->tasks) {
+                log().log("canceling {}", task->originalRequest().url.string());
+                task->cancel();
+            }
+        }
+        for (const std::string_view key : kTAVResourceIdentifiers) {
+            const std::string identifier(key);
+            if (self->_isAllowed(identifier))
+                self->_addResource(identifier, bag->resourceURL(identifier));
+            else
+                log().log("{} is disabled, not downloading", identifier);
+        }
+        self->_saveResources();
+    });
+}
+
+void DownloadManager::_addResource(const std::string& identifier, const std::optional<Url>& url)
+{
+    if (!url) return _deleteResource(identifier, File::Remove);
+    DownloadResource& resource = _resources.try_emplace(identifier, DownloadResource{identifier}).first->second;
+    if (!downloadReason(resource, *url, _fileExists(identifier))) {
+        _pending.erase(identifier);
+        return;
+    }
+    if (!_pending.insert_or_assign(identifier, *url).second) return;
+    _queue->after(kDelay, [weak = weak_from_this(), identifier] {
+        if (const auto self = weak.lock()) self->_startPending(identifier);
+    });
+}
+
+void DownloadManager::_startPending(const std::string& identifier)
+{
+    const auto pending = _pending.extract(identifier);
+    const auto found = _resources.find(identifier);
+    if (!pending || found == _resources.end()) return;
+    if (!_isAllowed(identifier)) return log().log("{} is disabled, not downloading", identifier);
+    if (const auto reason = downloadReason(found->second, pending.mapped(), _fileExists(identifier)))
+        _downloadResource(found->second, pending.mapped(), *reason);
+}
+
+void DownloadManager::_downloadResource(const DownloadResource& resource, const Url& url, std::string_view reason)
+{
+    UrlRequest request = _createDownloadRequest(resource, url);
+    log().log("starting download of {} reason: {} delay: {:f} headers: {}", url.string(), reason,
+              platform::toSeconds(kDelay), textOf(request.headers));
+    const auto task = _assembly.downloadURLSession->downloadTask(std::move(request));
+    if (!task) return log().error("download task error {}", task.error().description());
+    (*task)->setNote(url.string()); // the request's URL has the service's items too
+    (*task)->resume();
+}
+
+UrlRequest DownloadManager::_createDownloadRequest(const DownloadResource& resource, const Url& url) const
+{
+    // Without its file, an answer that it is current would be of no use.
+    const std::string version = _fileExists(resource.identifier) ? _resourceVersion(resource) : "";
+    UrlRequest request =
+        _assembly.requestFactory->fileDownloadRequest(url, version, isLookupResource(resource.identifier));
+    request.headers.set(kIdentifierHeader, resource.identifier);
+    return request;
+}
+
+std::string DownloadManager::_resourceVersion(const DownloadResource& resource) const
+{
+    if (isLookupResource(resource.identifier) && resource.redirectUrl) {
+        const auto lookup = _lookupResources.lock();
+        return lookup ? lookup->signatureFromURL(*resource.redirectUrl).value_or("") : "";
+    }
+    return resource.url ? resource.url->queryValue("version").value_or("") : "";
+}
+
+bool DownloadManager::_isAllowed(const std::string& identifier) const
+{
+    const auto lookup = _lookupResources.lock();
+    return !isLookupResource(identifier) || !lookup || lookup->lookupEnabled();
+}
+
+bool DownloadManager::_fileExists(const std::string& identifier) const
+{
+    const auto path = _pathToResource(identifier);
+    const auto info = path ? _assembly.fileManager.info(*path) : std::unexpected(path.error());
+    return info && info->kind == platform::FileInfo::Kind::File;
+}
+
+platform::Result<fs::path> DownloadManager::_pathToResource(const std::string& identifier) const
+{
+    if (identifier.empty())
+        return std::unexpected(makeTAVError(TAVErrorInvalidResponse, "error resource bag key is nil"));
+    if (!isResource(identifier)) return std::unexpected(makeTAVError(TAVErrorNotFound, "no resource " + identifier));
+    return _assembly.device.directories.caches / kDirectory / identifier;
+}
+
+void DownloadManager::_deleteResource(const std::string& identifier, File file)
+{
+    log().info("deleting resource: {}", identifier);
+    _resources.erase(identifier);
+    _pending.erase(identifier);
+    if (file == File::Keep) return;
+    const auto path = _pathToResource(identifier);
+    if (!path) return log().error("error trying to get path to file for deletion {}", path.error().description());
+    const auto removed = _assembly.fileManager.remove(*path);
+    if (!removed && removed.error().code != ENOENT)
+        log().error("error deleting resource {}: {}", identifier, removed.error().description());
+    _assembly.notificationCenter.post({.name = TAVFileDeletedNotification, .userInfo = {{"identifier", identifier}}});
+}
+
+void DownloadManager::taskDidFinishDownloading(const std::shared_ptr<platform::BackgroundTask>& task,
+                                               const fs::path& file, const UrlResponse& response)
+{
+    const UrlRequest& request = task->originalRequest();
+    const std::string identifier = identifierOf(request);
+    if (identifier.empty())
+        return log().error("failed to find download for identifier: {} url: {}", identifier, request.url.string());
+    const auto path = _pathToResource(identifier);
+    if (!path) return log().error("failed getting destination URL for {}", identifier);
+
+    if (response.statusCode == 200) {
+        log().log("download of {} finished {}", identifier, response.url.string());
+        const auto made = _assembly.fileManager.createDirectories(path->parent_path());
+        if (!made) return log().error("error getting cache directory {}", made.error().description());
+        const auto replaced = _assembly.fileManager.replace(*path, file);
+        if (!replaced) return log().error("error copying download {}", replaced.error().description());
+    } else {
+        log().log("download of {} got a {} response", identifier, response.statusCode);
+        if (response.statusCode != 304) return;
+    }
+    _start(); // a task of an earlier process may report before the first bag
+    _queue->async([weak = weak_from_this(), identifier, path = *path, note = task->note(), request, response] {
+        const auto self = weak.lock();
+        if (!self) return;
+        self->_noteReceived(identifier, note, request, response);
+        if (response.statusCode == 200)
+            self->_assembly.notificationCenter.post({.name = TAVFileDownloadCompletedNotification,
+                                                     .userInfo = {{"identifier", identifier}, {"url", path}}});
+    });
+}
+
+void DownloadManager::_noteReceived(const std::string& identifier, const Value& note, const UrlRequest& request,
+                                    const UrlResponse& response)
+{
+    _queue->assertOnQueue();
+    const auto found = _resources.find(identifier);
+    if (found == _resources.end()) // no longer in the bag, or to be fetched anew
+        return log().error("could not find resource for download identifier: {} url: {}", identifier,
+                           request.url.string());
+    DownloadResource& resource = found->second;
+    resource.url = note.asString() ? Url::parse(*note.asString()) : std::nullopt;
+    resource.redirectUrl = response.url == request.url ? std::nullopt : std::optional(response.url);
+    log().log("{} url: {}", identifier, response.url.string());
+    _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.resourcefilesfetched");
+    _saveResources();
+}
+
+void DownloadManager::taskDidComplete(const std::shared_ptr<platform::BackgroundTask>& task,
+                                      const std::optional<UrlResponse>& response,
+                                      const std::optional<platform::Error>& error)
+{
+    if (error && error->code == platform::kUrlCancelled) return;
+    std::string reason;
+    if (error)
+        reason = fmt::format("download error {} {}", error->description(), error->code);
+    else if (!response || response->url.empty())
+        return log().error("task completed with nil url and error: {}", "none");
+    else if (response->statusCode != 200 && response->statusCode != 304)
+        reason = fmt::format("status code {}", response->statusCode);
+    else
+        return; // noted with the file
+    log().error("download task error {} url: {}", makeTAVError(TAVErrorInvalidResponse, reason).description(),
+                task->originalRequest().url.string());
 }
 
 } // namespace tavrin

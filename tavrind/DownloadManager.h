@@ -1,30 +1,111 @@
 #pragma once
 
+#include <atomic>
+#include <filesystem>
+#include <map>
+#include <memory>
+#include <optional>
 #include <string>
 
+#include "platform/BackgroundSession.h"
 #include "platform/Files.h"
+#include "platform/NotificationCenter.h"
 #include "platform/Value.h"
+#include "tavrind/DownloadResource.h"
+
+namespace platform {
+class Queue;
+}
 
 namespace tavrin {
 
 struct Assembly;
+class TAVBag;
 
-/// The resource files that the bag lists. It has none yet. Any thread.
-class DownloadManager {
+/// A resource's file was replaced: "identifier" (std::string) and "url" (std::filesystem::path, where it is).
+inline constexpr const char* TAVFileDownloadCompletedNotification = "TAVFileDownloadCompletedNotification";
+/// A resource's file was deleted: "identifier".
+inline constexpr const char* TAVFileDeletedNotification = "TAVFileDeletedNotification";
+
+/// What the download manager needs to know of lookup hints, from whoever installs them. Any thread.
+class LookupResources {
 public:
-    explicit DownloadManager(Assembly& assembly) : _assembly(assembly) {}
+    virtual ~LookupResources() = default;
+    [[nodiscard]] virtual bool lookupEnabled() const = 0;
+    /// The version of the hints at a URL; none for a URL that tells none.
+    [[nodiscard]] virtual std::optional<std::string> signatureFromURL(const platform::Url& url) const = 0;
+};
+
+/// Keeps a local copy of each resource file that the bag lists.
+///
+/// Every bag cancels what is under way and gives each resource a reason to be downloaded (`downloadReason`), or none. A
+/// download starts 60 s after its reason came up, if that still holds then; reasons that come up meanwhile join it. The
+/// session has a day to carry it out, across restarts. An answer of status 200 replaces the file in one step, 304
+/// leaves it; only then is the resource's URL noted, so that a download that failed has its reason again with the next
+/// bag. A resource that the bag no longer lists is deleted.
+///
+/// Any thread.
+class DownloadManager : public platform::BackgroundSessionDelegate,
+                        public std::enable_shared_from_this<DownloadManager> {
+public:
+    /// Begins to follow the bag.
+    static std::shared_ptr<DownloadManager> make(Assembly& assembly);
+    explicit DownloadManager(Assembly& assembly);
+    ~DownloadManager() override;
+
+    /// Until this is called, lookups are taken for enabled, and their hints for unversioned.
+    void setLookupResources(std::weak_ptr<LookupResources> lookupResources);
+
+    [[nodiscard]] std::optional<DownloadResource> resourceForKey(const std::string& identifier);
+    /// Resource identifier to version, of those that have one.
+    [[nodiscard]] platform::Dictionary resourceVersions();
 
     struct Resource {
         platform::FileHandle file;
-        platform::Value attributes; ///< dictionary
+        platform::Value attributes; ///< dictionary: "size" (bytes), "modified" and "created" (dates)
     };
-    /// A handle of its own for each call; a resource that isn't there is error 404.
+    /// A handle of its own for each call, which keeps reading the same file when it is replaced. A resource that isn't
+    /// there is error 404.
     [[nodiscard]] platform::Result<Resource> fileHandleForResource(const std::string& identifier) const;
-    /// Resource identifier to version.
-    [[nodiscard]] platform::Dictionary resourceVersions() const { return {}; }
+
+    // From the download session, on its delegate queue.
+    void taskDidFinishDownloading(const std::shared_ptr<platform::BackgroundTask>& task,
+                                  const std::filesystem::path& file, const platform::UrlResponse& response) override;
+    void taskDidComplete(const std::shared_ptr<platform::BackgroundTask>& task,
+                         const std::optional<platform::UrlResponse>& response,
+                         const std::optional<platform::Error>& error) override;
 
 private:
-    [[maybe_unused]] Assembly& _assembly;
+    enum class File { Keep, Remove };
+    using Tasks = std::vector<std::shared_ptr<platform::BackgroundTask>>;
+
+    void bagChangeNotification(const std::shared_ptr<const TAVBag>& bag);
+    void _handleSignificantLocationChange();
+    void _start();
+    void _loadResources();
+    void _saveResources();
+    void _downloadBagResources(const std::shared_ptr<const TAVBag>& bag);
+    void _addResource(const std::string& identifier, const std::optional<platform::Url>& url);
+    void _deleteResource(const std::string& identifier, File file);
+    void _startPending(const std::string& identifier);
+    void _downloadResource(const DownloadResource& resource, const platform::Url& url, std::string_view reason);
+    [[nodiscard]] platform::UrlRequest _createDownloadRequest(const DownloadResource& resource,
+                                                              const platform::Url& url) const;
+    [[nodiscard]] std::string _resourceVersion(const DownloadResource& resource) const;
+    [[nodiscard]] bool _isAllowed(const std::string& identifier) const;
+    [[nodiscard]] bool _fileExists(const std::string& identifier) const;
+    [[nodiscard]] platform::Result<std::filesystem::path> _pathToResource(const std::string& identifier) const;
+    void _noteReceived(const std::string& identifier, const platform::Value& note, const platform::UrlRequest& request,
+                       const platform::UrlResponse& response);
+
+    Assembly& _assembly;
+    const std::shared_ptr<platform::Queue> _queue; // guards all below but the flag and the observers
+    DownloadResources _resources;
+    std::map<std::string, platform::Url> _pending; // downloads whose 60 s run
+    std::weak_ptr<LookupResources> _lookupResources;
+    std::atomic<bool> _started = false;
+    platform::NotificationCenter::Token _bagObserver;
+    platform::NotificationCenter::Token _locationObserver;
 };
 
 } // namespace tavrin

@@ -64,12 +64,13 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device)
                                                        sessionQueue("com.quorvane.tavrind.urlSession"));
     assembly.requestFactory = TAVNetworkRequestFactory::make(assembly);
     assembly.subscriptionManager = std::make_shared<TavrinSubscriptionManager>(assembly, assembly.requestFactory);
-    assembly.downloadManager = std::make_shared<DownloadManager>(assembly);
+    assembly.downloadManager = DownloadManager::make(assembly);
     assembly.persistentStorage = std::make_shared<TavrinPersistentStorage>(assembly);
     assembly.crowdsourcingFeedbackFlusher = TavrinFeedbackFlusher::make(assembly, 0);
     assembly.backgroundFlusher = BackgroundActivitiesManager::make(assembly);
-    assembly.downloadURLSession =
-        device.urlLoader.makeSession({.caFile = caFile()}, sessionQueue("com.quorvane.tavrind.downloadSession"));
+    assembly.downloadURLSession = device.backgroundSessions.make(
+        {.identifier = "com.quorvane.tavrind", .allowsMetered = false, .resourceTimeout = 24h, .caFile = caFile()},
+        assembly.downloadManager, device.serialQueue("com.quorvane.tavrind.downloadSession"));
     assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.launch");
     assembly.bagSession = device.urlLoader.makeSession({.connectionPurgeTimeout = 10s, .caFile = caFile()},
                                                        sessionQueue("com.quorvane.tavrind.bagSession"));

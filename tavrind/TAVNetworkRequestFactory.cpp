@@ -494,6 +494,9 @@ void TAVNetworkRequestFactory::_updateLocation(const std::optional<platform::Loc
 {
     if (!location || !_supportedGeoLocationSources.contains(location->source)) return _setNoLocationWithReason(reason);
     _currentLocation = location;
+    const bool moved = _area && platform::isSignificantMove(*_area, *location);
+    if (moved || !_area) _area = location;
+    if (moved) _assembly.notificationCenter.post({.name = TAVSignificantLocationChange, .object = this});
     _context.geoLocationLatLng = fmt::format("{:f},{:f}", location->latitude, location->longitude);
     _context.geoLocationSource = location->source;
 }

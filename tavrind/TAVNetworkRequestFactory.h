@@ -28,6 +28,9 @@ struct TAVRequest;
 class TAVBag;
 class TavrinBagController;
 
+/// Posted by the request factory when the device has moved to another area; see `platform::isSignificantMove`.
+inline constexpr const char* TAVSignificantLocationChange = "TAVSignificantLocationChange";
+
 /// Bit of a field mask: leave out where the device is and which applications it has.
 inline constexpr std::uint64_t kFieldMaskNoLocation = 1;
 
@@ -135,6 +138,7 @@ private:
     std::shared_ptr<platform::Queue> _contextAccessQueue;
     RequestContext _context; // on _contextAccessQueue, like all below
     std::optional<platform::Location> _currentLocation;
+    std::optional<platform::Location> _area; // where the last significant move led, or the first location known
     bool _locationServicesSetUp = false;
     std::set<std::string> _supportedGeoLocationSources;
     platform::NotificationCenter::Token _bagObserver;

@@ -1,0 +1,330 @@
+#include <gtest/gtest.h>
+
+#include <unistd.h>
+
+#include "CoreTavrin/TAVBag.h"
+#include "tavrind/Assembly.h"
+#include "tavrind/DownloadManager.h"
+#include "tavrind/TAVNetworkRequestFactory.h"
+#include "tavrind/TavrinBagController.h"
+#include "tests/support/TestDevice.h"
+
+namespace tavrin {
+namespace {
+
+using namespace std::chrono_literals;
+using platform::Dictionary;
+using platform::Url;
+using platform::Value;
+
+std::optional<Url> urlOf(std::string_view text)
+{
+    return Url::parse(text);
+}
+
+TEST(DownloadReason, IsANewUrlAMissingFileOrALookup)
+{
+    const Url url = *urlOf("https://r.example/a?version=2");
+    const std::string plain = "TAVQIFeatures", hints = "TAVLookupHintsWeekly";
+    const struct {
+        DownloadResource resource;
+        bool fileExists;
+        std::optional<std::string_view> reason;
+    } cases[]{
+        {{plain}, false, "update"},
+        {{plain}, true, "update"},
+        {{plain, urlOf("https://r.example/a?version=1")}, true, "update"},
+        {{plain, url}, false, "missing"},
+        {{plain, url}, true, {}},
+        {{plain, url, urlOf("https://elsewhere.example/")}, true, {}},
+        {{hints}, true, "update"},
+        {{hints, url}, false, "missing"},
+        {{hints, url}, true, "lookup"},
+    };
+    for (const auto& c : cases) EXPECT_EQ(downloadReason(c.resource, url, c.fileExists), c.reason);
+}
+
+TEST(DownloadTable, ReadsBackWhatItIsGivenAndNothingElse)
+{
+    const DownloadResources resources{
+        {"TAVQIFeatures", {"TAVQIFeatures", urlOf("https://r.example/a"), urlOf("https://r.example/b")}},
+        {"TAVVistrelModels", {"TAVVistrelModels"}}};
+    EXPECT_EQ(resourcesIn(valueOf(resources)), resources);
+    EXPECT_EQ(resourcesIn(Value::dictionaryOf({{"../bag.plist", Dictionary{{"url", "https://r.example/a"}}},
+                                               {"TAVQIFeatures", "https://r.example/a"},
+                                               {"TAVVistrelModels", Dictionary{{"url", 1}, {"redirect_url", "x"}}}})),
+              (DownloadResources{{"TAVVistrelModels", {"TAVVistrelModels"}}}));
+    for (const Value& broken : {Value(), Value("x"), Value(Value::Array{1})}) EXPECT_TRUE(resourcesIn(broken).empty());
+}
+
+struct FakeLookup final : LookupResources {
+    bool enabled = true;
+    bool lookupEnabled() const override { return enabled; }
+    std::optional<std::string> signatureFromURL(const Url& url) const override { return "signature of " + url.path(); }
+};
+
+struct DownloadManagerTest : testing::Test {
+    DownloadManagerTest()
+    {
+        assembly.requestFactory = TAVNetworkRequestFactory::make(assembly);
+        makeManager();
+    }
+
+    void makeManager()
+    {
+        manager = DownloadManager::make(assembly);
+        manager->setLookupResources(lookup);
+        assembly.downloadManager = manager;
+        assembly.downloadURLSession = device.background.make({.identifier = "com.quorvane.tavrind"}, manager,
+                                                             device.device.serialQueue("test.delegate"));
+        device.drain();
+    }
+
+    void bag(Dictionary resources)
+    {
+        device.notifications.post(
+            {.name = TAVBagChangeNotification,
+             .userInfo = {{"bag", std::make_shared<const TAVBag>(std::move(resources), "Vistrel/4")}}});
+        device.drain();
+    }
+    auto& tasks() { return device.background.sessions.at("com.quorvane.tavrind")->tasks; }
+    /// A bag that lists one resource, and the download that it leads to.
+    auto download(const std::string& identifier, std::string url)
+    {
+        bag({{identifier, std::move(url)}});
+        device.advance(60s);
+        return tasks().empty() ? nullptr : tasks().back();
+    }
+    void deliver(int status, std::string contents, std::optional<Url> from = {})
+    {
+        tasks().back()->deliver(status, std::move(contents), std::move(from));
+        device.drain();
+    }
+    std::string header(const platform::UrlRequest& request, std::string_view name)
+    {
+        const std::string* value = request.headers.find(name);
+        return value ? *value : "";
+    }
+    std::string contents(const std::string& identifier)
+    {
+        const auto found = device.files.files.find(directory / identifier);
+        return found == device.files.files.end() ? "(none)" : found->second;
+    }
+    Value storedUrl(const std::string& identifier)
+    {
+        return device.userDefaults.value("download_resources")[identifier]["url"];
+    }
+
+    const std::filesystem::path directory = "/caches/com.quorvane.tavrind";
+    platform::test::TestDevice device;
+    platform::test::LogCapture log;
+    Assembly assembly{device.device};
+    std::shared_ptr<FakeLookup> lookup = std::make_shared<FakeLookup>();
+    std::shared_ptr<DownloadManager> manager;
+    std::vector<std::string> told;
+    platform::NotificationCenter::Token completed =
+        device.notifications.observe(TAVFileDownloadCompletedNotification, [this](const platform::Notification& n) {
+            told.push_back(n.get<std::string>("identifier") + " at " + n.get<std::filesystem::path>("url").string() +
+                           ": " + device.files.files.at(n.get<std::filesystem::path>("url")));
+        });
+    platform::NotificationCenter::Token deleted =
+        device.notifications.observe(TAVFileDeletedNotification, [this](const platform::Notification& n) {
+            if (n.userInfo.contains("url")) ADD_FAILURE();
+            if (n.get<std::string>("identifier") == "TAVQIFeatures") told.push_back("deleted");
+        });
+};
+
+TEST_F(DownloadManagerTest, AResourceIsFetchedOnceForEachUrlWithTheVersionAtHand)
+{
+    bag({{"TAVQIFeatures", "https://r.example/f?version=1"}});
+    device.advance(59s);
+    EXPECT_TRUE(tasks().empty());
+    device.advance(1s);
+    ASSERT_EQ(tasks().size(), 1u);
+    const auto& first = tasks()[0]->originalRequest();
+    EXPECT_TRUE(tasks()[0]->resumed);
+    EXPECT_EQ(first.url.queryValue("version"), "1");
+    EXPECT_EQ(header(first, "X-Quorvane-Download-Identifier"), "TAVQIFeatures");
+    EXPECT_EQ(header(first, "If-None-Match"), "");
+    EXPECT_TRUE(log.count("reason: update delay: 60.000000"));
+    EXPECT_TRUE(storedUrl("TAVQIFeatures").isNull()) << "not before the answer";
+    EXPECT_EQ(manager->fileHandleForResource("TAVQIFeatures").error().code, 404);
+
+    deliver(200, "one");
+    EXPECT_EQ(contents("TAVQIFeatures"), "one");
+    EXPECT_EQ(told.back(), "TAVQIFeatures at /caches/com.quorvane.tavrind/TAVQIFeatures: one");
+    EXPECT_EQ(storedUrl("TAVQIFeatures"), Value("https://r.example/f?version=1"));
+    EXPECT_EQ(manager->resourceVersions(), (Dictionary{{"TAVQIFeatures", "1"}}));
+    EXPECT_EQ(device.counters.value("com.quorvane.tavrind.resourcefilesfetched"), 1);
+
+    EXPECT_EQ(download("TAVQIFeatures", "https://r.example/f?version=1")->identifier(), 1u) << "nothing new";
+    const auto second = download("TAVQIFeatures", "https://r.example/f?version=2");
+    EXPECT_EQ(header(second->originalRequest(), "If-None-Match"), "1");
+    const std::size_t before = told.size();
+    deliver(304, "");
+    EXPECT_EQ(contents("TAVQIFeatures"), "one");
+    EXPECT_EQ(told.size(), before);
+    EXPECT_EQ(manager->resourceVersions(), (Dictionary{{"TAVQIFeatures", "2"}}));
+
+    device.files.files.erase(directory / "TAVQIFeatures");
+    const auto third = download("TAVQIFeatures", "https://r.example/f?version=2");
+    EXPECT_TRUE(log.count("reason: missing"));
+    EXPECT_EQ(header(third->originalRequest(), "If-None-Match"), "") << "word that it is current would not help";
+}
+
+TEST_F(DownloadManagerTest, WhatFailsLeavesTheOldFileAndIsTriedAgainWithTheNextBag)
+{
+    download("TAVQIFeatures", "https://r.example/f?version=1");
+    deliver(200, "old");
+    const platform::Error cut("UrlErrorDomain", platform::kUrlConnectionLost);
+    const struct {
+        const char* what;
+        std::function<void()> happens;
+        const char* line;
+    } cases[]{
+        {"not there", [&] { deliver(404, "sorry"); }, "status code 404"},
+        {"server error", [&] { deliver(500, ""); }, "status code 500"},
+        {"cut off", [&] { tasks().back()->fail(cut); }, "download error"},
+        {"disk full",
+         [&] {
+             device.files.fault = [](auto operation, auto&) { return operation == "replace" ? ENOSPC : 0; };
+             deliver(200, "new");
+         },
+         "error copying download"},
+        {"no directory",
+         [&] {
+             device.files.fault = [](auto operation, auto&) { return operation == "mkdir" ? EACCES : 0; };
+             deliver(200, "new");
+         },
+         "error getting cache directory"},
+        {"cancelled", [&] { tasks().back()->cancel(); }, ""},
+    };
+    std::size_t started = 1;
+    for (const auto& c : cases) {
+        const int lines = log.count(c.line);
+        download("TAVQIFeatures", "https://r.example/f?version=2");
+        ASSERT_EQ(tasks().size(), ++started) << c.what;
+        c.happens();
+        device.drain();
+        device.files.fault = nullptr;
+        EXPECT_GT(log.count(c.line), lines) << c.what;
+        EXPECT_EQ(contents("TAVQIFeatures"), "old") << c.what;
+        EXPECT_EQ(storedUrl("TAVQIFeatures"), Value("https://r.example/f?version=1")) << c.what;
+    }
+    EXPECT_EQ(device.counters.value("com.quorvane.tavrind.resourcefilesfetched"), 1);
+    download("TAVQIFeatures", "https://r.example/f?version=2");
+    deliver(200, "");
+    EXPECT_EQ(contents("TAVQIFeatures"), "") << "an empty answer is an empty file";
+}
+
+TEST_F(DownloadManagerTest, BagsInQuickSuccessionLeadToOneDownloadOfTheLast)
+{
+    bag({{"TAVQIFeatures", "https://r.example/f?version=1"}, {"TAVVistrelModels", "https://r.example/m"}});
+    device.advance(30s);
+    bag({{"TAVQIFeatures", "https://r.example/f?version=2"}});
+    device.advance(300s);
+    ASSERT_EQ(tasks().size(), 1u) << "one is no longer listed, the other was asked for twice";
+    EXPECT_EQ(tasks()[0]->originalRequest().url.queryValue("version"), "2");
+
+    bag({{"TAVQIFeatures", "https://r.example/f?version=3"}});
+    EXPECT_TRUE(tasks()[0]->finished) << "cancelled";
+    EXPECT_TRUE(log.count("canceling https://r.example/f?"));
+    deliver(200, "two"); // came too late
+    EXPECT_EQ(contents("TAVQIFeatures"), "(none)");
+    device.advance(60s);
+    ASSERT_EQ(tasks().size(), 2u);
+    deliver(200, "three");
+    EXPECT_EQ(contents("TAVQIFeatures"), "three");
+}
+
+TEST_F(DownloadManagerTest, WhatTheBagNoLongerListsIsDeleted)
+{
+    download("TAVQIFeatures", "https://r.example/f");
+    deliver(200, "x");
+    told.clear();
+    bag({});
+    EXPECT_EQ(contents("TAVQIFeatures"), "(none)");
+    EXPECT_FALSE(manager->resourceForKey("TAVQIFeatures"));
+    EXPECT_TRUE(device.userDefaults.value("download_resources")["TAVQIFeatures"].isNull());
+    EXPECT_EQ(told, std::vector<std::string>{"deleted"});
+    device.notifications.post({.name = TAVBagChangeNotification, .userInfo = {{"bagError", platform::Error()}}});
+    device.drain();
+    EXPECT_EQ(told.size(), 1u) << "a failed fetch changes nothing";
+}
+
+TEST_F(DownloadManagerTest, LookupHintsFollowTheBagTheirRedirectAndTheLocation)
+{
+    device.notifications.post(
+        {.name = TAVBagChangeNotification,
+         .userInfo = {{"bag", std::make_shared<const TAVBag>(
+                                  Dictionary{{"supportedGeoLocationSources", Value::Array{"wifi"}}}, "Vistrel/4")}}});
+    device.drain();
+    device.location.moveTo(platform::fuzz(47.37, 8.54, "wifi"));
+    device.drain();
+    assembly.requestFactory->setPerformedSearch();
+    device.drain();
+
+    const std::string hints = "TAVLookupHintsWeekly";
+    const auto first = download(hints, "https://r.example/hints?version=1");
+    EXPECT_EQ(header(first->originalRequest(), "X-Quorvane-FuzzedLatLong"), "47.375000,8.536891");
+    deliver(200, "x", urlOf("https://r.example/de/hints/2026/w1"));
+    EXPECT_EQ(device.userDefaults.value("download_resources")[hints]["redirect_url"],
+              Value("https://r.example/de/hints/2026/w1"));
+
+    const auto second = download(hints, "https://r.example/hints?version=1");
+    EXPECT_NE(first, second) << "with every bag";
+    EXPECT_EQ(header(second->originalRequest(), "If-None-Match"), "signature of /de/hints/2026/w1");
+    deliver(304, "", urlOf("https://r.example/de/hints/2026/w1"));
+
+    lookup->enabled = false;
+    EXPECT_EQ(download(hints, "https://r.example/hints?version=2"), second);
+    bag({});
+    EXPECT_EQ(contents(hints), "x") << "left as it was";
+    EXPECT_TRUE(manager->resourceForKey(hints));
+    EXPECT_TRUE(log.count("TAVLookupHintsWeekly is disabled, not downloading"));
+    lookup->enabled = true;
+
+    device.location.moveTo(platform::fuzz(47.40, 8.56, "wifi")); // 4 km
+    device.drain();
+    EXPECT_TRUE(manager->resourceForKey(hints));
+    device.location.moveTo(platform::fuzz(47.50, 8.72, "wifi"));
+    device.drain();
+    EXPECT_FALSE(manager->resourceForKey(hints));
+    EXPECT_EQ(contents(hints), "x");
+    const auto third = download(hints, "https://r.example/hints?version=1");
+    EXPECT_EQ(header(third->originalRequest(), "If-None-Match"), "") << "another place has other hints";
+}
+
+TEST_F(DownloadManagerTest, ADownloadOutlivesTheProcess)
+{
+    const auto task = download("TAVQIFeatures", "https://r.example/f?version=7");
+    makeManager();
+    tasks().push_back(task); // the session takes it up
+    device.background.sessions.at("com.quorvane.tavrind")->adopt(*task);
+    deliver(200, "seven");
+    EXPECT_EQ(contents("TAVQIFeatures"), "seven");
+    EXPECT_EQ(manager->resourceVersions(), (Dictionary{{"TAVQIFeatures", "7"}}));
+    makeManager();
+    EXPECT_EQ(manager->resourceVersions(), (Dictionary{{"TAVQIFeatures", "7"}})) << "before the first bag";
+}
+
+TEST_F(DownloadManagerTest, ServesResourcesAndNoOtherFiles)
+{
+    download("TAVQIFeatures", "https://r.example/f");
+    deliver(200, "four");
+    device.files.files[directory / "bag.plist"] = "secret";
+    device.files.directories.insert(directory / "TAVVistrelModels");
+
+    const auto found = manager->fileHandleForResource("TAVQIFeatures");
+    ASSERT_TRUE(found);
+    std::array<char, 8> buffer{};
+    EXPECT_EQ(read(found->file.fd(), buffer.data(), buffer.size()), 4);
+    EXPECT_EQ(found->attributes["size"], Value(4));
+    EXPECT_TRUE(found->attributes["modified"].asDate());
+    for (const auto& [name, code] :
+         {std::pair("TAVCorrectionDict", 404), {"bag.plist", 404}, {"../x", 404}, {"", 500}, {"TAVVistrelModels", 500}})
+        EXPECT_EQ(manager->fileHandleForResource(name).error().code, code) << name;
+}
+
+} // namespace
+} // namespace tavrin
