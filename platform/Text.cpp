@@ -2,8 +2,15 @@
 
 #include <algorithm>
 
+#include <unicode/brkiter.h>
 #include <unicode/bytestream.h>
 #include <unicode/casemap.h>
+#include <unicode/coll.h>
+#include <unicode/stsearch.h>
+#include <unicode/tblcoll.h>
+#include <unicode/uchar.h>
+#include <unicode/unistr.h>
+#include <unicode/utf8.h>
 
 namespace platform {
 
@@ -33,6 +40,79 @@ std::string lowerCased(std::string_view text)
     UErrorCode status = U_ZERO_ERROR;
     icu::CaseMap::utf8ToLower("", 0, icu::StringPiece(text.data(), static_cast<int32_t>(text.size())), sink, nullptr, status);
     return result;
+}
+
+namespace {
+
+constexpr std::size_t kMaximumLength = 1u << 20; // bytes
+
+icu::UnicodeString unicode(std::string_view text)
+{
+    text = text.substr(0, kMaximumLength);
+    return icu::UnicodeString::fromUTF8(icu::StringPiece(text.data(), static_cast<int32_t>(text.size())));
+}
+
+} // namespace
+
+std::string_view trimmed(std::string_view text)
+{
+    const char* bytes = text.data();
+    auto end = static_cast<int32_t>(std::min<std::size_t>(text.size(), INT32_MAX));
+    int32_t begin = 0;
+    UChar32 c = 0;
+    for (int32_t next = 0; next < end; begin = next) {
+        U8_NEXT(bytes, next, end, c);
+        if (!u_isUWhiteSpace(c)) break;
+    }
+    for (int32_t before = end; before > begin; end = before) {
+        U8_PREV(bytes, begin, before, c);
+        if (!u_isUWhiteSpace(c)) break;
+    }
+    return text.substr(static_cast<std::size_t>(begin), static_cast<std::size_t>(end - begin));
+}
+
+std::vector<std::string> wordsIn(std::string_view text, const std::string& locale)
+{
+    UErrorCode status = U_ZERO_ERROR;
+    const std::unique_ptr<icu::BreakIterator> iterator(
+        icu::BreakIterator::createWordInstance(icu::Locale(locale.c_str()), status));
+    if (U_FAILURE(status)) return {};
+    const icu::UnicodeString whole = unicode(text);
+    iterator->setText(whole);
+    std::vector<std::string> words;
+    int32_t begin = iterator->first();
+    for (int32_t end = iterator->next(); end != icu::BreakIterator::DONE; begin = end, end = iterator->next())
+        if (iterator->getRuleStatus() >= UBRK_WORD_NONE_LIMIT)
+            whole.tempSubStringBetween(begin, end).toUTF8String(words.emplace_back());
+    return words;
+}
+
+struct LocalizedSearch::Impl {
+    icu::UnicodeString text;
+    std::unique_ptr<icu::Collator> collator;
+};
+
+LocalizedSearch::LocalizedSearch(std::string_view text, const std::string& locale) : _impl(std::make_unique<Impl>())
+{
+    UErrorCode status = U_ZERO_ERROR;
+    _impl->text = unicode(text);
+    _impl->collator.reset(icu::Collator::createInstance(icu::Locale(locale.c_str()), status));
+    if (_impl->collator) _impl->collator->setStrength(icu::Collator::SECONDARY); // accents count, case doesn't
+}
+
+LocalizedSearch::~LocalizedSearch() = default;
+LocalizedSearch::LocalizedSearch(LocalizedSearch&&) noexcept = default;
+
+bool LocalizedSearch::contains(std::string_view part) const
+{
+    const icu::UnicodeString pattern = unicode(part);
+    auto* collator = dynamic_cast<icu::RuleBasedCollator*>(_impl->collator.get());
+    if (!collator || pattern.isEmpty() || _impl->text.isEmpty()) return false;
+    UErrorCode status = U_ZERO_ERROR;
+    if (collator->compare(pattern, icu::UnicodeString(), status) == UCOL_EQUAL) return false;
+    icu::StringSearch search(pattern, _impl->text, collator, nullptr, status);
+    const int32_t found = search.first(status);
+    return U_SUCCESS(status) && found != USEARCH_DONE;
 }
 
 } // namespace platform

@@ -1,8 +1,10 @@
 #pragma once
 
 #include <cstddef>
+#include <memory>
 #include <string>
 #include <string_view>
+#include <vector>
 
 namespace platform {
 
@@ -11,5 +13,28 @@ namespace platform {
 
 /// A text in lower case, by Unicode's rules without those of any one language.
 [[nodiscard]] std::string lowerCased(std::string_view text);
+
+/// The text without white space (Unicode's White_Space) at its ends.
+[[nodiscard]] std::string_view trimmed(std::string_view text);
+
+/// The words of a text, as `locale` ("de_CH") divides it, in order: letters, digits and ideographs, without what is
+/// between them. Texts beyond 1 MiB are cut off there.
+[[nodiscard]] std::vector<std::string> wordsIn(std::string_view text, const std::string& locale);
+
+/// A text to look for others in, as `locale` compares them, without regard to case: "STRASSE" is in "die Straße", but
+/// "resume" isn't in "résumé". One thread at a time.
+class LocalizedSearch {
+public:
+    /// Texts beyond 1 MiB are cut off there.
+    LocalizedSearch(std::string_view text, const std::string& locale);
+    ~LocalizedSearch();
+    LocalizedSearch(LocalizedSearch&&) noexcept;
+    /// Nothing that compares as empty is contained.
+    [[nodiscard]] bool contains(std::string_view part) const;
+
+private:
+    struct Impl;
+    std::unique_ptr<Impl> _impl;
+};
 
 } // namespace platform
