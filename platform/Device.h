@@ -22,6 +22,7 @@ class NetworkStatus;
 class NotificationCenter;
 class ProcessIdentity;
 class RunLoop;
+class SubscriptionServices;
 class Transactions;
 class UrlLoader;
 class UserDefaults;
@@ -58,6 +59,7 @@ struct Device {
     LocationSource& location;
     DeviceProfileSource& profile;
     InstalledApplications& applications;
+    SubscriptionServices& subscriptions;
     ProcessIdentity& processes;
     SystemNotifier& systemNotifier;
     UrlLoader& urlLoader;

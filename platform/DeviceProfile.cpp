@@ -2,6 +2,7 @@
 
 #include <cerrno>
 #include <mutex>
+#include <vector>
 
 #include "platform/Files.h"
 #include "platform/FileWatch.h"
@@ -44,7 +45,7 @@ public:
     void onChange(std::function<void(const DeviceProfile&)> handler) override
     {
         std::lock_guard lock(_mutex);
-        _handler = std::move(handler);
+        _handlers.push_back(std::move(handler));
     }
 
 private:
@@ -63,24 +64,24 @@ private:
 
     void changed()
     {
-        std::function<void(const DeviceProfile&)> handler;
+        std::vector<std::function<void(const DeviceProfile&)>> handlers;
         DeviceProfile fresh = read();
         {
             std::lock_guard lock(_mutex);
             if (fresh == _profile) return;
             _profile = fresh;
-            handler = _handler;
+            handlers = _handlers;
         }
-        if (handler) handler(fresh);
+        for (const auto& handler : handlers) handler(fresh);
     }
 
     FileSystem& _files;
     const std::filesystem::path _path;
     RunLoop& _runLoop;
     std::mutex _mutex;
-    std::optional<DeviceProfile> _profile;              // under the mutex
-    std::function<void(const DeviceProfile&)> _handler; // under the mutex
-    std::optional<FileWatch> _watch;                    // loop's thread
+    std::optional<DeviceProfile> _profile;                             // under the mutex
+    std::vector<std::function<void(const DeviceProfile&)>> _handlers; // under the mutex
+    std::optional<FileWatch> _watch;                                   // loop's thread
 };
 
 } // namespace
@@ -92,6 +93,7 @@ DeviceProfile deviceProfileFromValue(const Value& value)
     profile.countryCode = text(value, "countryCode");
     profile.storefront = text(value, "storefront");
     profile.managedAccount = value["managedAccount"].asBool().value_or(false);
+    profile.newsSubscribed = value["newsSubscribed"].asBool().value_or(false);
     const double scale = value["screenScale"].asDouble().value_or(1.0);
     if (scale >= kSmallestScale && scale <= kLargestScale)
         profile.screenScale = scale;

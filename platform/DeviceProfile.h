@@ -18,6 +18,7 @@ struct DeviceProfile {
     std::optional<std::string> countryCode;    ///< "countryCode": ISO 3166, overrides the locale's region
     std::optional<std::string> storefront;     ///< "storefront": the media store's storefront identifier
     bool managedAccount = false;               ///< "managedAccount"
+    bool newsSubscribed = false;               ///< "newsSubscribed": to the maker's own news
     double screenScale = 1.0;                  ///< "screenScale": 0.5 to 8; else 1.0
     std::optional<std::string> geoMetadata;    ///< "geoMetadata": the geo client's metadata string
     std::optional<std::string> geoEnvironment; ///< "geoEnvironment": name of the geo resource environment
@@ -35,7 +36,7 @@ class DeviceProfileSource {
 public:
     virtual ~DeviceProfileSource() = default;
     [[nodiscard]] virtual DeviceProfile profile() = 0;
-    /// Called on the run loop's thread with the new profile after a change. One handler.
+    /// Called on the run loop's thread with the new profile after a change, beside the handlers that are there.
     virtual void onChange(std::function<void(const DeviceProfile&)> handler) = 0;
 };
 

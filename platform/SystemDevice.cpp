@@ -20,6 +20,7 @@
 #include "platform/NotificationCenter.h"
 #include "platform/Process.h"
 #include "platform/RunLoop.h"
+#include "platform/SubscriptionServices.h"
 #include "platform/Transactions.h"
 #include "platform/UrlSession.h"
 #include "platform/UserDefaults.h"
@@ -64,6 +65,7 @@ struct SystemDevice::Impl {
           location(makeGeoClueLocationSource(runLoop)),
           profile(makeDeviceProfileSource(*files, directories.config / name / "device.json", runLoop)),
           applications(makeInstalledApplications(*files, dataDirectories(directories), runLoop, *clock)),
+          subscriptions(makeSubscriptionServices(*files, directories.config / name / "subscriptions.d", runLoop, *clock)),
           processes(makeProcessIdentity()), notifier(makeSessionBusNotifier(runLoop)),
           ipc(ipc::makeBusTransport(runLoop, pool, *clock, directories.runtime / name)), loader(makeCurlLoader()),
           network(makeNetworkManagerStatus(runLoop)),
@@ -93,6 +95,7 @@ struct SystemDevice::Impl {
                  .location = *location,
                  .profile = *profile,
                  .applications = *applications,
+                 .subscriptions = *subscriptions,
                  .processes = *processes,
                  .systemNotifier = *notifier,
                  .urlLoader = *loader,
@@ -121,6 +124,7 @@ struct SystemDevice::Impl {
     std::unique_ptr<LocationSource> location;
     std::unique_ptr<DeviceProfileSource> profile;
     std::unique_ptr<InstalledApplications> applications;
+    std::unique_ptr<SubscriptionServices> subscriptions;
     std::unique_ptr<ProcessIdentity> processes;
     std::unique_ptr<SystemNotifier> notifier;
     std::unique_ptr<ipc::Transport> ipc;

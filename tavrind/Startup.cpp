@@ -63,7 +63,7 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device)
     assembly.urlSession = device.urlLoader.makeSession(foregroundConfiguration(device.userDefaults),
                                                        sessionQueue("com.quorvane.tavrind.urlSession"));
     assembly.requestFactory = TAVNetworkRequestFactory::make(assembly);
-    assembly.subscriptionManager = std::make_shared<TavrinSubscriptionManager>(assembly, assembly.requestFactory);
+    assembly.subscriptionManager = TavrinSubscriptionManager::make(assembly, assembly.requestFactory);
     assembly.downloadManager = DownloadManager::make(assembly);
     assembly.persistentStorage = std::make_shared<TavrinPersistentStorage>(assembly);
     assembly.crowdsourcingFeedbackFlusher = TavrinFeedbackFlusher::make(assembly, 0);

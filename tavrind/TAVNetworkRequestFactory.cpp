@@ -478,7 +478,6 @@ void TAVNetworkRequestFactory::_updateTimeZone()
 void TAVNetworkRequestFactory::_updateProfile(const platform::DeviceProfile& profile)
 {
     _context.geoDeviceCountryCode = profile.countryCode.value_or(_assembly.device.locale.locale().region);
-    _context.storeFrontIdentifier = profile.storefront.value_or("");
     _context.isManagedAccount = profile.managedAccount;
     _context.geoClientMetadata = profile.geoMetadata.value_or("");
     _context.geoEnvironment = profile.geoEnvironment.value_or("");

@@ -1,10 +1,127 @@
 #include "tavrind/TavrinSubscriptionManager.h"
 
+#include "CoreTavrin/TAVBag.h"
+#include "platform/Device.h"
+#include "platform/DeviceProfile.h"
+#include "platform/SubscriptionServices.h"
+#include "tavrind/Assembly.h"
+#include "tavrind/TavrinBagController.h"
+#include "tavrind/TavrinLogging.h"
+
 namespace tavrin {
+
+using platform::Value;
+
+namespace {
+
+constexpr const char* kFuse = "fuse";
+
+const platform::Log& log()
+{
+    return TavrinLogForCategory(kLogSubscription);
+}
+
+} // namespace
+
+std::shared_ptr<TavrinSubscriptionManager>
+TavrinSubscriptionManager::make(Assembly& assembly, std::weak_ptr<TavrinSubscriptionManagerDelegate> delegate)
+{
+    auto manager = std::make_shared<TavrinSubscriptionManager>(assembly, std::move(delegate));
+    const std::weak_ptr weak = manager;
+    assembly.device.subscriptions.onChange([weak] {
+        if (const auto self = weak.lock()) self->onQueue(&TavrinSubscriptionManager::_updateSubscriptions);
+    });
+    assembly.device.profile.onChange([weak](const platform::DeviceProfile&) {
+        if (const auto self = weak.lock()) self->onQueue(&TavrinSubscriptionManager::_profileChanged);
+    });
+    manager->_bagObserver = assembly.notificationCenter.observe(
+        TAVBagChangeNotification, [weak](const platform::Notification& notification) {
+            const auto self = weak.lock();
+            auto bag = notification.get<std::shared_ptr<const TAVBag>>("bag");
+            if (!self || !bag) return;
+            self->_queue->async([weak, bag = std::move(bag)] {
+                const auto again = weak.lock();
+                if (!again) return;
+                again->_bag = bag;
+                again->_updateSubscriptions();
+            });
+        });
+    manager->onQueue(&TavrinSubscriptionManager::_initializeStorefront);
+    return manager;
+}
 
 TavrinSubscriptionManager::TavrinSubscriptionManager(Assembly& assembly,
                                                      std::weak_ptr<TavrinSubscriptionManagerDelegate> delegate)
-    : _assembly(assembly), _delegate(std::move(delegate))
+    : _assembly(assembly), _delegate(std::move(delegate)),
+      _queue(assembly.device.serialQueue("com.quorvane.tavrin.subscriptionsByProvider-Queue"))
 {}
+
+std::vector<Value> TavrinSubscriptionManager::subscriptions() const
+{
+    return _queue->sync([this] { return values(); });
+}
+
+void TavrinSubscriptionManager::onQueue(void (TavrinSubscriptionManager::*step)())
+{
+    _queue->async([weak = weak_from_this(), step] {
+        if (const auto self = weak.lock()) (self.get()->*step)();
+    });
+}
+
+void TavrinSubscriptionManager::_initializeStorefront()
+{
+    _updateStorefrontIdentifier(_assembly.device.profile.profile().storefront);
+}
+
+void TavrinSubscriptionManager::_profileChanged()
+{
+    _initializeStorefront();
+    _updateSubscriptions();
+}
+
+void TavrinSubscriptionManager::_updateStorefrontIdentifier(const std::optional<std::string>& storefront)
+{
+    if (const auto delegate = _delegate.lock()) delegate->didUpdateStorefrontIdentifier(storefront);
+}
+
+void TavrinSubscriptionManager::_updateSubscriptions()
+{
+    _queue->assertOnQueue();
+    log().info("updating subscriptions");
+    const auto domains = _bag ? _bag->subscriptionProviderDomainWhitelist() : std::nullopt;
+    const auto bundles = _bag ? _bag->subscriptionProviderBundleIdentifierWhitelist() : std::nullopt;
+    if (!domains || !bundles) return _setSubscriptions({});
+
+    auto services = _assembly.device.subscriptions.activeServices(
+        {.bundleIdentifiers = *bundles,
+         .domains = *domains,
+         .maximumExpiration = platform::durationFromSeconds(_bag->subscriptionTTL())});
+    if (!services)
+        log().error("Error fetching third party subscription information from daemon: {}",
+                    services.error().description());
+    std::map<std::string, Value> all = services ? std::move(*services) : std::map<std::string, Value>();
+    all[kFuse] = Value::dictionaryOf(
+        {{"provider", kFuse}, {"attribute", "premium"}, {"active", _assembly.device.profile.profile().newsSubscribed}});
+    _setSubscriptions(std::move(all));
+}
+
+void TavrinSubscriptionManager::_setSubscriptions(std::map<std::string, Value> subscriptionsByProvider)
+{
+    if (subscriptionsByProvider == _subscriptionsByProvider) return;
+    _subscriptionsByProvider = std::move(subscriptionsByProvider);
+    _updateDelegate();
+}
+
+void TavrinSubscriptionManager::_updateDelegate()
+{
+    if (const auto delegate = _delegate.lock()) delegate->didUpdateSubscriptionDictionaries(values());
+}
+
+std::vector<Value> TavrinSubscriptionManager::values() const
+{
+    std::vector<Value> all;
+    for (const auto& [provider, subscription] : _subscriptionsByProvider) all.push_back(subscription);
+    return all;
+}
 
 } // namespace tavrin

@@ -41,6 +41,7 @@ struct RequestFactoryTest : testing::Test {
             {.name = TAVBagChangeNotification, .userInfo = {{"bag", std::make_shared<const TAVBag>(bag)}}});
         device.drain();
         device.location.moveTo(platform::Location{47.375, 8.545, "wifi"});
+        factory->didUpdateStorefrontIdentifier("143459");
         factory->didUpdateSubscriptionDictionaries({platform::Value::dictionaryOf({{"provider", "fuse"}})});
         device.drain();
     }

@@ -14,6 +14,7 @@
 #include "platform/Log.h"
 #include "platform/NotificationCenter.h"
 #include "platform/Process.h"
+#include "platform/SubscriptionServices.h"
 #include "platform/Transactions.h"
 #include "platform/UserDefaults.h"
 #include "tests/support/FakeBackground.h"
@@ -55,13 +56,13 @@ struct FakeLocation final : LocationSource {
 
 struct FakeProfile final : DeviceProfileSource {
     DeviceProfile current;
-    std::function<void(const DeviceProfile&)> handler;
+    std::vector<std::function<void(const DeviceProfile&)>> handlers;
     DeviceProfile profile() override { return current; }
-    void onChange(std::function<void(const DeviceProfile&)> newHandler) override { handler = std::move(newHandler); }
+    void onChange(std::function<void(const DeviceProfile&)> handler) override { handlers.push_back(std::move(handler)); }
     void change(DeviceProfile profile)
     {
         current = std::move(profile);
-        handler(current);
+        for (const auto& handler : handlers) handler(current);
     }
 };
 
@@ -73,6 +74,18 @@ struct FakeApplications final : InstalledApplications {
     {
         ++readings;
         return installed;
+    }
+    void onChange(std::function<void()> newHandler) override { handler = std::move(newHandler); }
+};
+
+struct FakeSubscriptions final : SubscriptionServices {
+    Result<std::map<std::string, Value>> services;
+    SubscriptionQuery asked;
+    std::function<void()> handler;
+    Result<std::map<std::string, Value>> activeServices(const SubscriptionQuery& query) override
+    {
+        asked = query;
+        return services;
     }
     void onChange(std::function<void()> newHandler) override { handler = std::move(newHandler); }
 };
@@ -158,6 +171,7 @@ struct TestDevice {
     FakeLocation location;
     FakeProfile profile;
     FakeApplications applications;
+    FakeSubscriptions subscriptions;
     FakeProcesses processes;
     FakeNotifier notifier;
     FakeUrlLoader loader;
@@ -184,6 +198,7 @@ struct TestDevice {
                   .location = location,
                   .profile = profile,
                   .applications = applications,
+                  .subscriptions = subscriptions,
                   .processes = processes,
                   .systemNotifier = notifier,
                   .urlLoader = loader,

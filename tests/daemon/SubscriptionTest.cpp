@@ -1,0 +1,150 @@
+#include <gtest/gtest.h>
+
+#include "CoreTavrin/TAVBag.h"
+#include "tavrind/Assembly.h"
+#include "tavrind/TAVNetworkRequestFactory.h"
+#include "tavrind/TavrinBagController.h"
+#include "tavrind/TavrinSubscriptionInfo.h"
+#include "tavrind/TavrinSubscriptionManager.h"
+#include "tests/support/TestDevice.h"
+
+namespace tavrin {
+namespace {
+
+using namespace std::chrono_literals;
+using platform::Dictionary;
+using platform::Value;
+
+TEST(SubscriptionInfo, ReadsPairsOrRefusesTheWholeText)
+{
+    const struct {
+        std::string text;
+        std::optional<Dictionary> pairs;
+        const char* complaint;
+    } cases[]{
+        {"type=news,expires=3600", Dictionary{{"type", "news"}, {"expires", "3600"}}, nullptr},
+        {"\t type = the news \r\n,\n expires\u00a0= 3600 ", Dictionary{{"type", "the news"}, {"expires", "3600"}},
+         nullptr},
+        {"a=b=c", Dictionary{{"a", "b=c"}}, nullptr},
+        {"a==", Dictionary{{"a", "="}}, nullptr},
+        {"", {}, nullptr},
+        {"a=b,a=c", {}, "duplicate key a (full string: a=b,a=c)"},
+        {"a=b,c", {}, "invalid key-value pair c (full string: a=b,c)"},
+        {"a=b,", {}, "invalid key-value pair  (full string: a=b,)"},
+        {",", {}, "invalid key-value pair"},
+        {"=b", {}, "empty key or value"},
+        {"a= ", {}, "empty key or value"},
+        {"a=\xff\xfe,\x80=b", Dictionary{{"a", "\xff\xfe"}, {"\x80", "b"}}, nullptr},
+        {"a=" + std::string(70'000, 'b'), {}, "more than 65536"},
+    };
+    for (const auto& c : cases) {
+        platform::test::LogCapture log;
+        EXPECT_EQ(TavrinSubscriptionInfo::dictionaryWithKeyValuePairListString(c.text), c.pairs) << c.text;
+        EXPECT_EQ(log.count(c.complaint ? c.complaint : "Subscription"), c.complaint ? 1 : 0) << c.text;
+    }
+}
+
+TEST(SubscriptionInfo, NeedsATypeAndExpiresSecondsFromNow)
+{
+    const platform::Date now = platform::dateFromSecondsSince1970(1'000'000);
+    const struct {
+        Dictionary dictionary;
+        bool valid;
+        std::optional<double> expires;
+    } cases[]{
+        {{{"type", "news"}, {"expires", "3600"}}, true, 1'003'600},
+        {{{"type", "news"}, {"expires", 3600}}, true, 1'003'600},
+        {{{"type", "news"}, {"expires", "-0.5"}}, true, 999'999.5},
+        {{{"type", "news"}}, true, {}},
+        {{{"type", "news"}, {"expires", "1e300"}}, true, 9.2e9},
+        {{{"type", "news"}, {"expires", "3600s"}}, false, {}},
+        {{{"type", "news"}, {"expires", ""}}, false, {}},
+        {{{"type", "news"}, {"expires", "nan"}}, false, {}},
+        {{{"type", "news"}, {"expires", Value()}}, false, {}},
+        {{{"type", ""}}, false, {}},
+        {{{"type", 3}}, false, {}},
+        {{{"expires", 3600}}, false, {}},
+    };
+    for (const auto& c : cases) {
+        const auto info = TavrinSubscriptionInfo::withDictionary(c.dictionary, now);
+        ASSERT_EQ(info.has_value(), c.valid) << platform::toJson(c.dictionary);
+        if (!info) continue;
+        EXPECT_EQ(info->type(), "news");
+        EXPECT_EQ(info->expirationDate().transform(platform::secondsSince1970), c.expires);
+    }
+    const auto info = TavrinSubscriptionInfo::withString("type=news, expires=10", now);
+    EXPECT_FALSE(info->isExpired(now + 10s));
+    EXPECT_TRUE(info->isExpired(now + 11s));
+    EXPECT_FALSE(TavrinSubscriptionInfo::withString("expires=10", now));
+}
+
+struct SubscriptionManagerTest : testing::Test {
+    SubscriptionManagerTest()
+    {
+        device.profile.current = {.storefront = "143459"};
+        factory = TAVNetworkRequestFactory::make(assembly);
+        manager = TavrinSubscriptionManager::make(assembly, factory);
+        device.drain();
+    }
+    void bag(Dictionary entries)
+    {
+        device.notifications.post(
+            {.name = TAVBagChangeNotification,
+             .userInfo = {{"bag", std::make_shared<const TAVBag>(std::move(entries), "Vistrel/4")}}});
+        device.drain();
+    }
+    std::string header() { return factory->context().subscriptionInfo; }
+
+    static constexpr const char* kFuseOnly = R"([{"provider":"fuse","attribute":"premium","active":false}])";
+    const Dictionary lists{{"subscriptionProviderDomainWhitelist", Value::Array{"d.example"}},
+                           {"subscriptionProviderBundleIdentifierWhitelist", Value::Array{"a", "b"}},
+                           {"subscriptionTTL", 60}};
+    platform::test::TestDevice device;
+    platform::test::LogCapture log;
+    Assembly assembly{device.device};
+    std::shared_ptr<TAVNetworkRequestFactory> factory;
+    std::shared_ptr<TavrinSubscriptionManager> manager;
+};
+
+TEST_F(SubscriptionManagerTest, TheHeaderFollowsTheBagTheProvidersAndTheProfile)
+{
+    EXPECT_EQ(header(), "") << "no bag yet";
+    device.subscriptions.handler();
+    device.drain();
+    EXPECT_EQ(header(), "");
+
+    bag(lists);
+    EXPECT_EQ(header(), kFuseOnly);
+    EXPECT_EQ(device.subscriptions.asked.bundleIdentifiers, (std::vector<std::string>{"a", "b"}));
+    EXPECT_EQ(device.subscriptions.asked.domains, std::vector<std::string>{"d.example"});
+    EXPECT_EQ(device.subscriptions.asked.maximumExpiration, 60s);
+
+    device.subscriptions.services = {{"daily", Value::dictionaryOf({{"provider", "daily"}})},
+                                     {"fuse", Value::dictionaryOf({{"provider", "an impostor"}})}};
+    device.subscriptions.handler();
+    device.drain();
+    device.profile.change({.storefront = "143441", .newsSubscribed = true});
+    device.drain();
+    EXPECT_EQ(header(), R"([{"provider":"daily"},{"provider":"fuse","attribute":"premium","active":true}])");
+    EXPECT_EQ(manager->subscriptions().size(), 2u);
+    EXPECT_EQ(factory->context().storeFrontIdentifier, "143441");
+
+    bag({{"subscriptionProviderDomainWhitelist", Value::Array{"d.example"}}});
+    EXPECT_EQ(header(), "") << "a list is missing";
+    EXPECT_TRUE(manager->subscriptions().empty());
+}
+
+TEST_F(SubscriptionManagerTest, AFailureOfTheProvidersLeavesTheMakersOwn)
+{
+    EXPECT_EQ(factory->context().storeFrontIdentifier, "143459");
+    device.subscriptions.services = std::unexpected(platform::Error::posix(EIO));
+    bag(lists);
+    EXPECT_EQ(header(), kFuseOnly);
+    EXPECT_EQ(log.count("Error fetching third party subscription information from daemon: "), 1);
+    device.notifications.post({.name = TAVBagChangeNotification, .userInfo = {{"bagError", platform::Error()}}});
+    device.drain();
+    EXPECT_EQ(header(), kFuseOnly);
+}
+
+} // namespace
+} // namespace tavrin
