@@ -14,6 +14,7 @@ class ActivityScheduler;
 class BackgroundSessions;
 class Clock;
 class CounterStore;
+class DataDetectorStore;
 class DeviceProfileSource;
 class InstalledApplications;
 class LocaleSource;
@@ -60,6 +61,7 @@ struct Device {
     DeviceProfileSource& profile;
     InstalledApplications& applications;
     SubscriptionServices& subscriptions;
+    DataDetectorStore& dataDetectors;
     ProcessIdentity& processes;
     SystemNotifier& systemNotifier;
     UrlLoader& urlLoader;

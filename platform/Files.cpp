@@ -179,6 +179,12 @@ public:
         return published;
     }
 
+    Result<void> copy(const fs::path& path, const FileHandle& source) override
+    {
+        if (lseek(source.fd(), 0, SEEK_SET) != 0) return std::unexpected(Error::posix(errno));
+        return publish(path, [&](int fd) { return copyAll(source.fd(), fd); });
+    }
+
     Result<void> createDirectories(const fs::path& path) override
     {
         if (mkdir(path.c_str(), 0700) == 0) return {};

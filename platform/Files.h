@@ -68,6 +68,8 @@ public:
     /// beside `path` first. Who has the old file open keeps reading that. A failure leaves the old file as it was;
     /// `source` is gone only after a success. Mode 0600.
     [[nodiscard]] virtual Result<void> replace(const std::filesystem::path& path, const std::filesystem::path& source) = 0;
+    /// Publishes a copy of what `source` holds as `path`, whole, like `writeAtomically`.
+    [[nodiscard]] virtual Result<void> copy(const std::filesystem::path& path, const FileHandle& source) = 0;
     /// Makes the directory and its parents, those made with mode 0700. One that is there already is fine.
     [[nodiscard]] virtual Result<void> createDirectories(const std::filesystem::path& path) = 0;
     [[nodiscard]] virtual Result<FileInfo> info(const std::filesystem::path& path) = 0;

@@ -9,6 +9,7 @@
 #include "platform/BackgroundSession.h"
 #include "platform/Clock.h"
 #include "platform/Counters.h"
+#include "platform/DataDetectorStore.h"
 #include "platform/Device.h"
 #include "platform/DeviceProfile.h"
 #include "platform/DeviceUse.h"
@@ -66,6 +67,7 @@ struct SystemDevice::Impl {
           profile(makeDeviceProfileSource(*files, directories.config / name / "device.json", runLoop)),
           applications(makeInstalledApplications(*files, dataDirectories(directories), runLoop, *clock)),
           subscriptions(makeSubscriptionServices(*files, directories.config / name / "subscriptions.d", runLoop, *clock)),
+          dataDetectors(makeDataDetectorStore(*files, directories.data / name / "data-detectors")),
           processes(makeProcessIdentity()), notifier(makeSessionBusNotifier(runLoop)),
           ipc(ipc::makeBusTransport(runLoop, pool, *clock, directories.runtime / name)), loader(makeCurlLoader()),
           network(makeNetworkManagerStatus(runLoop)),
@@ -96,6 +98,7 @@ struct SystemDevice::Impl {
                  .profile = *profile,
                  .applications = *applications,
                  .subscriptions = *subscriptions,
+                 .dataDetectors = *dataDetectors,
                  .processes = *processes,
                  .systemNotifier = *notifier,
                  .urlLoader = *loader,
@@ -125,6 +128,7 @@ struct SystemDevice::Impl {
     std::unique_ptr<DeviceProfileSource> profile;
     std::unique_ptr<InstalledApplications> applications;
     std::unique_ptr<SubscriptionServices> subscriptions;
+    std::unique_ptr<DataDetectorStore> dataDetectors;
     std::unique_ptr<ProcessIdentity> processes;
     std::unique_ptr<SystemNotifier> notifier;
     std::unique_ptr<ipc::Transport> ipc;

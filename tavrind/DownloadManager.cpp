@@ -301,13 +301,13 @@ void DownloadManager::taskDidFinishDownloading(const std::shared_ptr<platform::B
         if (response.statusCode != 304) return;
     }
     _start(); // a task of an earlier process may report before the first bag
-    _queue->async([weak = weak_from_this(), identifier, path = *path, note = task->note(), request, response] {
+    _queue->async([weak = weak_from_this(), identifier, where = *path, note = task->note(), request, response] {
         const auto self = weak.lock();
         if (!self) return;
         self->_noteReceived(identifier, note, request, response);
         if (response.statusCode == 200)
             self->_assembly.notificationCenter.post({.name = TAVFileDownloadCompletedNotification,
-                                                     .userInfo = {{"identifier", identifier}, {"url", path}}});
+                                                     .userInfo = {{"identifier", identifier}, {"url", where}}});
     });
 }
 

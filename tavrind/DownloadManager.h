@@ -77,7 +77,6 @@ public:
 
 private:
     enum class File { Keep, Remove };
-    using Tasks = std::vector<std::shared_ptr<platform::BackgroundTask>>;
 
     void bagChangeNotification(const std::shared_ptr<const TAVBag>& bag);
     void _handleSignificantLocationChange();

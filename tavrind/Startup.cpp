@@ -82,7 +82,7 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device)
                                        assembly.backgroundFlusher,
                                        device.serialQueue("com.quorvane.tavrind.uploadSession"));
     assembly.backgroundFlusher->findUploads();
-    assembly.lookup = std::make_shared<Lookup>(assembly);
+    assembly.lookup = Lookup::make(assembly);
     assembly.bagController = TavrinBagController::make(assembly);
     assembly.clientStateManager = ClientStateManager::make(assembly);
     assembly.appWhitelistController = AppWhitelistController::make(assembly);

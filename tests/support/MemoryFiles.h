@@ -23,6 +23,7 @@ public:
     Result<Bytes> read(const std::filesystem::path& path, std::size_t maximumSize) override;
     Result<void> writeAtomically(const std::filesystem::path& path, std::string_view contents) override;
     Result<void> replace(const std::filesystem::path& path, const std::filesystem::path& source) override;
+    Result<void> copy(const std::filesystem::path& path, const FileHandle& source) override;
     Result<void> createDirectories(const std::filesystem::path& path) override;
     Result<FileInfo> info(const std::filesystem::path& path) override;
     Result<void> remove(const std::filesystem::path& path) override;

@@ -6,6 +6,7 @@
 
 #include "platform/Counters.h"
 #include "platform/Device.h"
+#include "platform/DataDetectorStore.h"
 #include "platform/DeviceProfile.h"
 #include "platform/InstalledApplications.h"
 #include "platform/LocaleSource.h"
@@ -172,6 +173,7 @@ struct TestDevice {
     FakeProfile profile;
     FakeApplications applications;
     FakeSubscriptions subscriptions;
+    std::unique_ptr<DataDetectorStore> dataDetectors = makeDataDetectorStore(files, "/data/data-detectors");
     FakeProcesses processes;
     FakeNotifier notifier;
     FakeUrlLoader loader;
@@ -199,6 +201,7 @@ struct TestDevice {
                   .profile = profile,
                   .applications = applications,
                   .subscriptions = subscriptions,
+                  .dataDetectors = *dataDetectors,
                   .processes = processes,
                   .systemNotifier = notifier,
                   .urlLoader = loader,

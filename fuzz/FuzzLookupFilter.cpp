@@ -1,0 +1,31 @@
+#include "CoreTavrin/TAVRequest.h"
+#include "fuzz/Check.h"
+#include "platform/Log.h"
+#include "tavrind/Lookup.h"
+
+/// The input is the text around a word, and from the second line on a lookup's answer. Filtering drops results, in
+/// order, and changes nothing else; once filtered it stays as it is.
+int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
+{
+    platform::Log::threshold = platform::LogLevel::Fault;
+    const std::string_view text = textOf(data, size);
+    const std::size_t line = std::min(text.find('\n'), text.size());
+    auto response = platform::parseJson(text.substr(std::min(line + 1, text.size())));
+    if (!response) return 0;
+    tavrin::TAVLookupRequest request;
+    request.queryContext = std::string(text.substr(0, line));
+
+    const platform::Value before = *response;
+    tavrin::Lookup::filterLookupResultsWithRequest(request, *response, "de_CH");
+    check(response->count() == before.count());
+    for (std::size_t i = 0; i < before.count(); ++i) {
+        const platform::Value& kept = (*response)[i]["results"];
+        std::size_t from = 0;
+        for (std::size_t k = 0; k < kept.count(); ++k, ++from)
+            while (!(before[i]["results"][from] == kept[k])) check(++from < before[i]["results"].count());
+    }
+    const platform::Value once = *response;
+    tavrin::Lookup::filterLookupResultsWithRequest(request, *response, "de_CH");
+    check(*response == once);
+    return 0;
+}

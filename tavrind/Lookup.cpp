@@ -1,0 +1,247 @@
+#include "tavrind/Lookup.h"
+
+#include <algorithm>
+#include <set>
+#include <vector>
+
+#include "CoreTavrin/TAVBag.h"
+#include "CoreTavrin/TAVRequest.h"
+#include "platform/DataDetectorStore.h"
+#include "platform/Device.h"
+#include "platform/Text.h"
+#include "platform/UserDefaults.h"
+#include "tavrind/Assembly.h"
+#include "tavrind/TavrinLogging.h"
+
+namespace tavrin {
+
+using platform::Dictionary;
+using platform::FileHandle;
+using platform::Value;
+
+namespace {
+
+const platform::Log& log()
+{
+    return TavrinLogForCategory(kLogLookUp);
+}
+
+std::string identifierOf(Lookup::SourceKind kind)
+{
+    return std::string(kind == Lookup::Monthly ? kTAVLookupHintsMonthly : kTAVLookupHintsWeekly);
+}
+
+std::string versionIn(const Dictionary& versions, const std::string& identifier)
+{
+    const Value* version = versions.find(identifier);
+    return version && version->asString() ? *version->asString() : std::string();
+}
+
+std::string shortened(const Value& value)
+{
+    constexpr std::size_t kLongest = 200; // bytes of what may be megabytes
+    std::string text = platform::toJson(value);
+    if (text.size() > kLongest) text = text.substr(0, kLongest) + "…";
+    return text;
+}
+
+float numberIn(const Value& value)
+{
+    return static_cast<float>(value.asDouble().value_or(0));
+}
+
+std::string textIn(const Value& value)
+{
+    return value.asString() ? *value.asString() : std::string();
+}
+
+/// The weights of those keywords that the text has, each once; of a word that comes twice the last weight counts.
+float keywordScore(const Value& keywords, const platform::LocalizedSearch& context)
+{
+    Dictionary weights;
+    if (const Value::Array* array = keywords.asArray())
+        for (const Value& keyword : *array)
+            if (keyword["word"].asString()) weights.set(*keyword["word"].asString(), keyword["weight"]);
+    float score = 0;
+    for (const auto& [word, weight] : weights)
+        if (context.contains(word)) score += numberIn(weight);
+    return score;
+}
+
+/// Of the words of two texts, how many of all are in both.
+float jaccardIndex(const std::vector<std::string>& a, const std::vector<std::string>& b)
+{
+    const std::set<std::string_view> first(a.begin(), a.end());
+    std::set<std::string_view> all = first;
+    std::size_t shared = 0;
+    for (const std::string_view word : std::set<std::string_view>(b.begin(), b.end()))
+        if (!all.insert(word).second) ++shared;
+    return all.empty() ? 0 : static_cast<float>(shared) / static_cast<float>(all.size());
+}
+
+/// What results are measured against: the text around the word that is looked up.
+struct LookupContext {
+    platform::LocalizedSearch search;
+    std::vector<std::string> words;
+    std::string locale;
+
+    [[nodiscard]] bool keeps(const Value& instructions) const
+    {
+        const float score = keywordScore(instructions["keywords"], search);
+        const float minimum = numberIn(instructions["min_keywords_score"]);
+        const std::string completion = textIn(instructions["completion"]);
+        const bool completes = completion.empty() || search.contains(completion);
+        if (score < minimum || !completes) {
+            log().debug("dropping lookup result. keyword score: {:f} min keyword score: {:f} completion exists: {:d}",
+                        score, minimum, completes);
+            return false;
+        }
+        const float subjectMinimum = numberIn(instructions["min_subject_score"]);
+        if (subjectMinimum == 0) return true;
+        const std::string subject = textIn(instructions["subject"]);
+        const float index = subject.empty() ? 0 : jaccardIndex(words, platform::wordsIn(subject, locale));
+        if (subjectMinimum > index) {
+            log().debug("dropping lookup result. jaccard index: {:f} min subject score: {:f}", index, subjectMinimum);
+            return false;
+        }
+        return true;
+    }
+};
+
+} // namespace
+
+void Lookup::filterLookupResultsWithRequest(const TAVLookupRequest& request, Value& response, const std::string& locale)
+{
+    if (!response.asArray())
+        return log().error("lookup response is not an array. who knows what this is: {}", shortened(response));
+    if (response.count() == 0)
+        return log().error("no data to process for lookup response. request: {} response: {}", request.queryString,
+                           shortened(response));
+    const std::string text = request.queryContext.value_or("");
+    const LookupContext context{platform::LocalizedSearch(text, locale), platform::wordsIn(text, locale), locale};
+    for (Value& resultSet : response.mutableArray()) {
+        const Value::Array* results = resultSet["results"].asArray();
+        if (!results) continue;
+        Value::Array kept;
+        kept.reserve(results->size());
+        std::ranges::copy_if(*results, std::back_inserter(kept), [&](const Value& result) {
+            const Value& instructions = result["lookup_instructions"];
+            return !instructions.asDictionary() || context.keeps(instructions);
+        });
+        resultSet.mutableDictionary().set("results", std::move(kept));
+    }
+}
+
+std::shared_ptr<Lookup> Lookup::make(Assembly& assembly)
+{
+    auto lookup = std::make_shared<Lookup>(assembly);
+    const std::weak_ptr weak = lookup;
+    const auto handleFile = [weak](const platform::Notification& notification) {
+        if (const auto self = weak.lock()) self->_handleHintsFile(notification);
+    };
+    platform::NotificationCenter& notifications = assembly.notificationCenter;
+    lookup->_observers[0] = notifications.observe(TAVFileDownloadCompletedNotification, handleFile);
+    lookup->_observers[1] = notifications.observe(TAVFileDeletedNotification, handleFile);
+    lookup->_observers[2] = notifications.observe("TAVStartup", [weak](const platform::Notification&) {
+        if (const auto self = weak.lock()) self->_reprocessHintsFiles();
+    });
+    assembly.downloadManager->setLookupResources(lookup);
+    return lookup;
+}
+
+Lookup::Lookup(Assembly& assembly)
+    : _assembly(assembly), _queue(assembly.device.serialQueue("com.quorvane.tavrin.Lookup"))
+{}
+
+bool Lookup::lookupEnabled() const
+{
+    return !_assembly.device.lookupDefaults.boolean("LookupSuggestionsDisabled");
+}
+
+std::optional<std::string> Lookup::signatureFromURL(const platform::Url& url) const
+{
+    const std::string path = url.path();
+    std::vector<std::string_view> elements;
+    for (std::size_t begin = 0; begin <= path.size();) {
+        const std::size_t end = std::min(path.find('/', begin), path.size());
+        elements.push_back(std::string_view(path).substr(begin, end - begin));
+        begin = end + 1;
+    }
+    if (elements.size() <= 4) {
+        log().error("invalid lookup hints url when processing signature: {}", url.string());
+        return std::nullopt;
+    }
+    return fmt::format("{}-{}-{}", elements[3], elements[4], elements[2]);
+}
+
+void Lookup::_drainQueue()
+{
+    _queue->sync([] {});
+}
+
+void Lookup::_handleHintsFile(const platform::Notification& notification)
+{
+    const auto identifier = notification.get<std::string>("identifier");
+    for (const SourceKind kind : {Monthly, Weekly}) {
+        if (identifier != identifierOf(kind)) continue;
+        const auto location = notification.get<std::filesystem::path>("url");
+        _handleHintsFile(location.empty() ? std::nullopt : std::optional(location), kind);
+    }
+}
+
+void Lookup::_handleHintsFile(const std::optional<std::filesystem::path>& location, SourceKind kind)
+{
+    log().debug("processing lookup hints for location: {} sourceKind: {}", location ? location->string() : "none",
+                static_cast<int>(kind));
+    std::shared_ptr<FileHandle> file;
+    if (location) {
+        auto opened = _assembly.fileManager.openForReading(*location);
+        if (opened)
+            file = std::make_shared<FileHandle>(std::move(*opened));
+        else
+            log().error("error trying to open hints file: {} at location: {}", opened.error().description(),
+                        location->string());
+    }
+    _queue->async([weak = weak_from_this(), file, kind] {
+        const auto self = weak.lock();
+        if (!self) return;
+        const Dictionary versions = self->_assembly.downloadManager->resourceVersions();
+        self->_pushDDSourceFile(file.get(), kind, versionIn(versions, identifierOf(kind)));
+    });
+}
+
+void Lookup::_reprocessHintsFiles()
+{
+    log().debug("reprocessing lookup hints files");
+    _queue->async([weak = weak_from_this()] {
+        const auto self = weak.lock();
+        if (!self) return;
+        const Dictionary versions = self->_assembly.downloadManager->resourceVersions();
+        for (const SourceKind kind : {Monthly, Weekly}) self->_reprocessHintsFile(kind, versions);
+    });
+}
+
+void Lookup::_reprocessHintsFile(SourceKind kind, const Dictionary& versions)
+{
+    _queue->assertOnQueue();
+    const std::string identifier = identifierOf(kind);
+    const std::string version = versionIn(versions, identifier);
+    const auto signature = _assembly.device.dataDetectors.clientSignature(kind);
+    if (signature && *signature == version) return;
+    log().info("signature ({}) does not match version ({}), DD for kind: {} requires reprocessing",
+               signature.value_or(""), version, static_cast<int>(kind));
+    const auto resource = _assembly.downloadManager->fileHandleForResource(identifier);
+    if (!resource)
+        return log().info("reprocess file doesn't exist or there was an error. file: {} error: {}", "none",
+                          resource.error().description());
+    _pushDDSourceFile(&resource->file, kind, version);
+}
+
+void Lookup::_pushDDSourceFile(const FileHandle* file, SourceKind kind, const std::string& version)
+{
+    _queue->assertOnQueue();
+    const auto pushed = _assembly.device.dataDetectors.setSource(kind, file, version);
+    if (!pushed) log().error("failed to push data to data detectors: {}", pushed.error().description());
+}
+
+} // namespace tavrin
