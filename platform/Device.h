@@ -19,6 +19,7 @@ class DeviceProfileSource;
 class InstalledApplications;
 class LocaleSource;
 class LocationSource;
+class MemoryPressure;
 class NetworkStatus;
 class NotificationCenter;
 class ProcessIdentity;
@@ -63,6 +64,7 @@ struct Device {
     SubscriptionServices& subscriptions;
     DataDetectorStore& dataDetectors;
     ProcessIdentity& processes;
+    MemoryPressure& memoryPressure;
     SystemNotifier& systemNotifier;
     UrlLoader& urlLoader;
     NetworkStatus& network;

@@ -17,6 +17,7 @@
 #include "platform/Ipc.h"
 #include "platform/LocaleSource.h"
 #include "platform/LocationSource.h"
+#include "platform/MemoryPressure.h"
 #include "platform/NetworkStatus.h"
 #include "platform/NotificationCenter.h"
 #include "platform/Process.h"
@@ -68,7 +69,8 @@ struct SystemDevice::Impl {
           applications(makeInstalledApplications(*files, dataDirectories(directories), runLoop, *clock)),
           subscriptions(makeSubscriptionServices(*files, directories.config / name / "subscriptions.d", runLoop, *clock)),
           dataDetectors(makeDataDetectorStore(*files, directories.data / name / "data-detectors")),
-          processes(makeProcessIdentity()), notifier(makeSessionBusNotifier(runLoop)),
+          processes(makeProcessIdentity()), memoryPressure(makeMemoryPressure(runLoop)),
+          notifier(makeSessionBusNotifier(runLoop)),
           ipc(ipc::makeBusTransport(runLoop, pool, *clock, directories.runtime / name)), loader(makeCurlLoader()),
           network(makeNetworkManagerStatus(runLoop)),
           backgroundSessions(makeBackgroundSessions({.loader = *loader,
@@ -100,6 +102,7 @@ struct SystemDevice::Impl {
                  .subscriptions = *subscriptions,
                  .dataDetectors = *dataDetectors,
                  .processes = *processes,
+                 .memoryPressure = *memoryPressure,
                  .systemNotifier = *notifier,
                  .urlLoader = *loader,
                  .network = *network,
@@ -130,6 +133,7 @@ struct SystemDevice::Impl {
     std::unique_ptr<SubscriptionServices> subscriptions;
     std::unique_ptr<DataDetectorStore> dataDetectors;
     std::unique_ptr<ProcessIdentity> processes;
+    std::unique_ptr<MemoryPressure> memoryPressure;
     std::unique_ptr<SystemNotifier> notifier;
     std::unique_ptr<ipc::Transport> ipc;
     std::unique_ptr<UrlLoader> loader;

@@ -13,6 +13,7 @@
 #include "platform/LocationSource.h"
 #include "platform/NetworkStatus.h"
 #include "platform/Log.h"
+#include "platform/MemoryPressure.h"
 #include "platform/NotificationCenter.h"
 #include "platform/Process.h"
 #include "platform/SubscriptionServices.h"
@@ -107,6 +108,28 @@ struct FakeProcesses final : ProcessIdentity {
     }
 };
 
+struct FakeMemoryPressure final : MemoryPressure {
+    int watchers = 0;
+    std::unique_ptr<Watch> watch(std::function<void()> critical) override
+    {
+        return std::make_unique<Registration>(*this, std::move(critical));
+    }
+    void raise() { center.post({.name = "critical"}); }
+
+private:
+    struct Registration final : Watch {
+        Registration(FakeMemoryPressure& owner_, std::function<void()> critical)
+            : owner(owner_), token(owner.center.observe("critical", [critical = std::move(critical)](auto&) { critical(); }))
+        {
+            ++owner.watchers;
+        }
+        ~Registration() override { --owner.watchers; }
+        FakeMemoryPressure& owner;
+        NotificationCenter::Token token;
+    };
+    NotificationCenter center;
+};
+
 struct FakeNotifier final : SystemNotifier {
     std::vector<std::string> posted;
     void post(const std::string& name) override { posted.push_back(name); }
@@ -175,6 +198,7 @@ struct TestDevice {
     FakeSubscriptions subscriptions;
     std::unique_ptr<DataDetectorStore> dataDetectors = makeDataDetectorStore(files, "/data/data-detectors");
     FakeProcesses processes;
+    FakeMemoryPressure memoryPressure;
     FakeNotifier notifier;
     FakeUrlLoader loader;
     NetworkStatus network; ///< nothing is known until a test sets it
@@ -203,6 +227,7 @@ struct TestDevice {
                   .subscriptions = subscriptions,
                   .dataDetectors = *dataDetectors,
                   .processes = processes,
+                  .memoryPressure = memoryPressure,
                   .systemNotifier = notifier,
                   .urlLoader = loader,
                   .network = network,
