@@ -47,7 +47,7 @@ ClientState::ClientState(std::string identifier, Assembly& assembly)
         log().log("query cache OFF for {}", _identifier);
     } else {
         log().log("query cache ON for {}", _identifier);
-        _queryCache = std::make_shared<QueryCache>(assembly);
+        _queryCache = QueryCache::make(assembly);
     }
     if (assembly.sharedSession) {
         log().log("Tavrin is using shared instance of guid controller");

@@ -261,7 +261,7 @@ bool ClientState::_answerFromCache(Exchange& exchange)
 
     auto reply = std::make_shared<TAVReply>();
     reply->scale = query.scale;
-    if (query.verboseReply) reply->httpRequest = record(hit->request);
+    if (query.verboseReply) reply->httpRequest = record(*hit->request);
     reply->rawResponse = Bytes(platform::toJson(Value::Array{hit->resultSet}));
     reply->geoSessionEntityString = _assembly.requestFactory->getMapsUserSessionEntity();
     exchange.answer(std::move(reply), {});
@@ -390,12 +390,14 @@ bool ClientState::_mayCache(const JsonDocument& answer, const Exchange& exchange
 
 void ClientState::_cacheResponse(const Value& response, const Exchange& exchange)
 {
+    const auto request = std::make_shared<const UrlRequest>(exchange.httpRequest);
+    const platform::Date now = _assembly.device.clock.wallNow();
     for (const Value& set : *response.asArray()) {
         if (!set.asDictionary()) continue;
         const std::string* status = set["status"].asString();
         if (status && *status == "ERROR") continue;
-        _queryCache->set(std::make_shared<const CachedResultSet>(
-            CachedResultSet{exchange.request->queryString, exchange.httpRequest, set, exchange.start->uuid.value_or("")}));
+        _queryCache->set(std::make_shared<const CachedResultSet>(exchange.request->queryString, request, set,
+                                                                 exchange.start->uuid.value_or(""), now));
     }
 }
 

@@ -191,9 +191,15 @@ std::shared_ptr<TAVNetworkRequestFactory> TAVNetworkRequestFactory::make(Assembl
         self->_contextAccessQueue->barrierAsync([weak, change] {
             auto again = weak.lock();
             if (!again) return;
-            if (change == platform::LocaleSource::Change::TimeZone) return again->_updateTimeZone();
+            if (change == platform::LocaleSource::Change::TimeZone) {
+                again->_updateTimeZone();
+                return again->_post(TAVTimeZoneChangeNotification);
+            }
             again->_updateLocale();
-            again->_updateProfile(again->_assembly.device.profile.profile()); // the country may be the locale's
+            again->_post(TAVLocaleChangeNotification);
+            // The country may be the locale's.
+            if (again->_updateProfile(again->_assembly.device.profile.profile()))
+                again->_post(TAVCountryCodeChangeNotification);
             again->_notifyBagRefreshRequired();
         });
     });
@@ -203,9 +209,11 @@ std::shared_ptr<TAVNetworkRequestFactory> TAVNetworkRequestFactory::make(Assembl
         self->_contextAccessQueue->barrierAsync([weak, profile] {
             auto again = weak.lock();
             if (!again) return;
-            const std::string before = again->_context.geoDeviceCountryCode;
-            again->_updateProfile(profile);
-            if (again->_context.geoDeviceCountryCode != before) again->_notifyBagRefreshRequired();
+            const bool countryChanged = again->_updateProfile(profile);
+            again->_post(TAVEffectiveSettingsChangeNotification);
+            if (!countryChanged) return;
+            again->_post(TAVCountryCodeChangeNotification);
+            again->_notifyBagRefreshRequired();
         });
     });
     device.location.onChange([weak](const std::optional<platform::Location>& location, const std::string& reason) {
@@ -475,9 +483,11 @@ void TAVNetworkRequestFactory::_updateTimeZone()
     _context.localTimeZoneName = _assembly.device.locale.timeZone();
 }
 
-void TAVNetworkRequestFactory::_updateProfile(const platform::DeviceProfile& profile)
+/// True if the country is another now.
+bool TAVNetworkRequestFactory::_updateProfile(const platform::DeviceProfile& profile)
 {
-    _context.geoDeviceCountryCode = profile.countryCode.value_or(_assembly.device.locale.locale().region);
+    const std::string before = std::exchange(_context.geoDeviceCountryCode,
+                                             profile.countryCode.value_or(_assembly.device.locale.locale().region));
     _context.isManagedAccount = profile.managedAccount;
     _context.geoClientMetadata = profile.geoMetadata.value_or("");
     _context.geoEnvironment = profile.geoEnvironment.value_or("");
@@ -486,6 +496,12 @@ void TAVNetworkRequestFactory::_updateProfile(const platform::DeviceProfile& pro
     if (_context.geoSessionId.empty() && !_context.geoSessionEntity.empty())
         log().error("GEOUserSessionEntity does not respond to selector sessionIDString, actual class is {}",
                     "geoSession");
+    return _context.geoDeviceCountryCode != before;
+}
+
+void TAVNetworkRequestFactory::_post(const char* notification) const
+{
+    _assembly.notificationCenter.post({.name = notification});
 }
 
 void TAVNetworkRequestFactory::_updateLocation(const std::optional<platform::Location>& location,

@@ -30,6 +30,12 @@ class TavrinBagController;
 
 /// Posted by the request factory when the device has moved to another area; see `platform::isSignificantMove`.
 inline constexpr const char* TAVSignificantLocationChange = "TAVSignificantLocationChange";
+/// Posted once requests tell of the change, from a task of the factory's queue; no object, no user info.
+inline constexpr const char* TAVLocaleChangeNotification = "TAVLocaleChangeNotification";
+inline constexpr const char* TAVTimeZoneChangeNotification = "TAVTimeZoneChangeNotification";
+inline constexpr const char* TAVCountryCodeChangeNotification = "TAVCountryCodeChangeNotification";
+/// Something in the device's profile changed.
+inline constexpr const char* TAVEffectiveSettingsChangeNotification = "TAVEffectiveSettingsChangeNotification";
 
 /// Bit of a field mask: leave out where the device is and which applications it has.
 inline constexpr std::uint64_t kFieldMaskNoLocation = 1;
@@ -126,7 +132,8 @@ private:
     void _setUpDebuggingQueryItems();
     void _updateLocale();
     void _updateTimeZone();
-    void _updateProfile(const platform::DeviceProfile& profile);
+    bool _updateProfile(const platform::DeviceProfile& profile);
+    void _post(const char* notification) const;
     void _updateLocation(const std::optional<platform::Location>& location, const std::string& reason);
     void _setNoLocationWithReason(const std::string& reason);
     void _startLocationUpdate();

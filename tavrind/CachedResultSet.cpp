@@ -1,0 +1,74 @@
+#include "tavrind/CachedResultSet.h"
+
+#include <algorithm>
+#include <cmath>
+#include <cstdlib>
+
+#include "platform/Text.h"
+
+namespace tavrin {
+
+namespace {
+
+using platform::Date;
+using platform::Value;
+
+std::optional<Date> expireTimeOf(const Value& resultSet, Date now)
+{
+    constexpr double kLongest = 1e9; // some 30 years: no date lies beyond what a Date holds
+    const double maxAge = resultSet["max_age"].asDouble().value_or(0);
+    if (maxAge == 0) return std::nullopt;
+    return now + platform::durationFromSeconds(std::clamp(maxAge, -kLongest, kLongest));
+}
+
+std::string queryOf(const Value& resultSet)
+{
+    const std::string* query = resultSet["query"].asString();
+    return query ? platform::lowerCased(*query) : "";
+}
+
+float uiScaleOf(const platform::UrlRequest& request)
+{
+    const std::string* header = request.headers.find("X-Quorvane-UI-Scale");
+    return header ? std::strtof(header->c_str(), nullptr) : 0;
+}
+
+} // namespace
+
+CachedResultSet::CachedResultSet(std::string_view input_, std::shared_ptr<const platform::UrlRequest> request_,
+                                 Value resultSet_, std::string uuid_, Date now)
+    : input(platform::lowerCased(input_)), request(std::move(request_)), resultSet(std::move(resultSet_)),
+      uuid(std::move(uuid_)), expireTime(expireTimeOf(resultSet, now)), query(queryOf(resultSet)),
+      inputLength(platform::utf16Length(input)), queryLength(platform::utf16Length(query)),
+      completionScore(static_cast<float>(resultSet["completion_score"].asDouble().value_or(0))),
+      uiScale(uiScaleOf(*request))
+{}
+
+std::optional<platform::Uuid> CachedResultSet::userGuid() const
+{
+    const std::string* header = request->headers.find("X-Quorvane-UserGuid");
+    return header ? platform::Uuid::parse(*header) : std::nullopt;
+}
+
+CachedUse useOf(const CachedResultSet& set, std::size_t typedLength, double scale, Date now)
+{
+    if (set.expireTime && *set.expireTime <= now) return CachedUse::Expired;
+    // The service is told the scale to a tenth, so what is nearer than that is the same to it.
+    constexpr double kSameScale = 0.05 + 1e-6;
+    if (scale > 0 && std::abs(scale - set.uiScale) > kSameScale) return CachedUse::OtherScale;
+    return typedLength >= set.inputLength ? CachedUse::Candidate : CachedUse::OtherInput;
+}
+
+const CachedResultSet* pickCompletion(std::span<const CachedResultSet* const> candidates)
+{
+    const CachedResultSet* pick = nullptr;
+    for (const CachedResultSet* candidate : candidates) {
+        const bool shorter = !pick || candidate->queryLength < pick->queryLength;
+        const bool better = pick && candidate->queryLength == pick->queryLength && candidate->completionScore > 0 &&
+                            candidate->completionScore > pick->completionScore;
+        if (shorter || better) pick = candidate;
+    }
+    return pick;
+}
+
+} // namespace tavrin

@@ -1,0 +1,143 @@
+#include "tavrind/QueryCache.h"
+
+#include <fmt/format.h>
+
+#include "CoreTavrin/TAVRequest.h"
+#include "platform/Clock.h"
+#include "platform/Device.h"
+#include "platform/Text.h"
+#include "tavrind/Assembly.h"
+#include "tavrind/TAVNetworkRequestFactory.h"
+#include "tavrind/TavrinLogging.h"
+#include "tavrind/TavrinUserGUIDController.h"
+
+namespace tavrin {
+
+namespace {
+
+constexpr std::size_t kMaximumCost = 0x200000;
+
+const platform::Log& log()
+{
+    return TavrinLogForCategory(kLogCaching);
+}
+
+std::size_t costOf(const CachedResultSet& set)
+{
+    return static_cast<std::size_t>(static_cast<double>(platform::jsonSize(set.resultSet)) * 1.5);
+}
+
+} // namespace
+
+std::shared_ptr<QueryCache> QueryCache::make(Assembly& assembly)
+{
+    auto cache = std::make_shared<QueryCache>(assembly);
+    for (const char* name :
+         {TAVUserGUIDChangeNotification, TAVCountryCodeChangeNotification, TAVTimeZoneChangeNotification,
+          TAVLocaleChangeNotification, TAVEffectiveSettingsChangeNotification}) {
+        cache->_observers.push_back(assembly.notificationCenter.observe(name, [weak = cache->weak_from_this()](auto&) {
+            if (auto self = weak.lock()) self->_cacheClearNotification();
+        }));
+    }
+    return cache;
+}
+
+QueryCache::QueryCache(Assembly& assembly)
+    : _assembly(assembly), _queue(assembly.device.serialQueue("com.quorvane.tavrin.queryCache"))
+{}
+
+std::shared_ptr<const CachedResultSet> QueryCache::get(std::string text)
+{
+    return getRequest(*TAVSearchRequest::searchRequestWithString(std::move(text), StartSearchTrigger::Unknown));
+}
+
+std::shared_ptr<const CachedResultSet> QueryCache::getRequest(const TAVRequest& request)
+{
+    const std::string key = platform::lowerCased(request.queryString);
+    const std::size_t keyLength = platform::utf16Length(key);
+    log().debug("cache lookup: {}", key);
+    return _queue->sync([&]() -> std::shared_ptr<const CachedResultSet> {
+        const platform::Date now = _assembly.device.clock.wallNow();
+        std::vector<std::string> expired;
+        std::vector<const CachedResultSet*> candidates;
+        _tree.keysMatchingPrefix(key, [&](std::string_view query, const CachedResultSet& set, bool&) {
+            const CachedUse use = useOf(set, keyLength, request.scale, now);
+            if (use == CachedUse::Expired) expired.emplace_back(query);
+            if (use == CachedUse::Candidate) candidates.push_back(&set);
+        });
+        for (const std::string& query : expired) _tree.removeObjectForKey(query);
+
+        for (const CachedResultSet* set : candidates)
+            log().debug("entry {} prefix: {} input: {} score: {:f}", fmt::ptr(set), key, set->input,
+                        set->completionScore);
+        const CachedResultSet* pick = pickCompletion(candidates);
+        return pick ? pick->shared_from_this() : nullptr;
+    });
+}
+
+void QueryCache::set(std::shared_ptr<const CachedResultSet> set)
+{
+    if (set->query.empty() || set->query.contains('\0')) return;
+    if (set->inputLength > set->queryLength)
+        return log().error("BUG: NOT caching '{}' because input is longer than completed query '{}'", set->input,
+                           set->query);
+    _queue->async([self = shared_from_this(), set = std::move(set)]() mutable { self->_store(std::move(set)); });
+}
+
+void QueryCache::_store(std::shared_ptr<const CachedResultSet> set)
+{
+    _queue->assertOnQueue();
+    const std::size_t cost = costOf(*set);
+    if (cost >= kMaximumCost) return log().error("NOT caching '{}' with cost {}", set->query, cost);
+    log().log("caching '{}' with cost {}", set->query, cost);
+    if (_currentCost + cost >= kMaximumCost) {
+        log().log("!!! exceeded max cost, flushing cache !!!");
+        _clearCache();
+    }
+    if (!_source) _startListeningForMemoryPressure();
+    _tree.setObject(*set, set->query);
+    _stored.push_back(std::move(set));
+    _currentCost += cost;
+}
+
+void QueryCache::removeAllObjects()
+{
+    _queue->async([self = shared_from_this()] {
+        self->_clearCache();
+        self->_source.reset();
+    });
+}
+
+void QueryCache::_cacheClearNotification()
+{
+    removeAllObjects();
+}
+
+void QueryCache::_clearCache()
+{
+    _queue->assertOnQueue();
+    _tree.removeAllObjects();
+    _stored.clear();
+    _currentCost = 0;
+}
+
+void QueryCache::_startListeningForMemoryPressure()
+{
+    _source = _assembly.device.memoryPressure.watch([weak = weak_from_this()] {
+        auto self = weak.lock();
+        if (!self) return;
+        self->_queue->async([self] {
+            if (!self->_source) return; // stopped meanwhile
+            log().log("emptying cache under memory pressure");
+            self->_clearCache();
+            self->_source.reset();
+        });
+    });
+}
+
+std::size_t QueryCache::count() const
+{
+    return _queue->sync([this] { return _tree.count(); });
+}
+
+} // namespace tavrin

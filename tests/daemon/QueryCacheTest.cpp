@@ -1,0 +1,355 @@
+#include <algorithm>
+#include <random>
+
+#include "CoreTavrin/TAVFeedback.h"
+#include "CoreTavrin/TAVRequest.h"
+#include "platform/Text.h"
+#include "tavrind/QueryCache.h"
+#include "tavrind/TavrinUserGUIDController.h"
+#include "tests/support/DaemonFixture.h"
+
+namespace tavrin::test {
+namespace {
+
+using namespace std::chrono_literals;
+using platform::Date;
+constexpr Date kNow{};
+
+std::shared_ptr<const CachedResultSet> makeSet(std::string_view input, Dictionary resultSet, double scale = 0,
+                                               Date now = kNow)
+{
+    auto request = std::make_shared<platform::UrlRequest>();
+    if (scale > 0) request->headers.set("X-Quorvane-UI-Scale", fmt::format("{:.1f}", scale));
+    return std::make_shared<const CachedResultSet>(input, std::move(request), std::move(resultSet), "uuid", now);
+}
+
+TEST(CachedResultSet, ReadsWhatItIsMadeFrom)
+{
+    const auto set = makeSet("WÉA", {{"query", "WÉATHER 😀"}, {"max_age", 60}, {"completion_score", 0.5}}, 2);
+    EXPECT_EQ(set->input, "wéa");
+    EXPECT_EQ(set->query, "wéather 😀");
+    EXPECT_EQ(set->inputLength, 3u);
+    EXPECT_EQ(set->queryLength, 10u);
+    EXPECT_EQ(set->expireTime, kNow + 60s);
+    EXPECT_EQ(set->completionScore, 0.5f);
+    EXPECT_EQ(set->uiScale, 2.0f);
+    EXPECT_FALSE(set->userGuid());
+
+    const auto odd = makeSet("w", {{"query", 3}, {"max_age", "60"}, {"completion_score", "high"}});
+    EXPECT_TRUE(odd->query.empty() && !odd->expireTime && odd->completionScore == 0 && odd->uiScale == 0);
+    EXPECT_FALSE(makeSet("w", {{"max_age", 0}})->expireTime);
+    for (const double longAge : {1e300, 1e18, 2e9}) EXPECT_GT(makeSet("w", {{"max_age", longAge}})->expireTime, kNow);
+    EXPECT_LT(makeSet("w", {{"max_age", -1e300}})->expireTime, kNow);
+}
+
+TEST(CachedResultSet, IsUsedWhereAgeScaleAndInputFit)
+{
+    const auto set = makeSet("wea", {{"query", "weather"}, {"max_age", 60}}, 3);
+    const struct {
+        std::size_t typed;
+        double scale;
+        Date now;
+        CachedUse use;
+    } cases[]{
+        {4, 3, kNow, CachedUse::Candidate},     {3, 3, kNow, CachedUse::Candidate},
+        {2, 3, kNow, CachedUse::OtherInput},    {4, 0, kNow, CachedUse::Candidate},
+        {4, 2, kNow, CachedUse::OtherScale},    {4, 3.04, kNow, CachedUse::Candidate},
+        {4, 3.1, kNow, CachedUse::OtherScale},  {4, 3, kNow + 59s, CachedUse::Candidate},
+        {4, 3, kNow + 60s, CachedUse::Expired}, {2, 2, kNow + 60s, CachedUse::Expired},
+    };
+    for (const auto& c : cases) EXPECT_EQ(useOf(*set, c.typed, c.scale, c.now), c.use) << c.typed << " " << c.scale;
+    EXPECT_EQ(useOf(*makeSet("a", {{"query", "ab"}}, 1.25), 1, 1.25, kNow), CachedUse::Candidate)
+        << "the header has tenths";
+}
+
+TEST(CachedResultSet, TheShortestThenTheBestThenTheFirstIsPicked)
+{
+    const auto pick = [](const std::vector<std::pair<const char*, double>>& sets) {
+        std::vector<std::shared_ptr<const CachedResultSet>> kept;
+        std::vector<const CachedResultSet*> candidates;
+        for (const auto& [query, score] : sets) {
+            kept.push_back(makeSet("w", {{"query", query}, {"completion_score", score}}));
+            candidates.push_back(kept.back().get());
+        }
+        const auto found = std::ranges::find(candidates, pickCompletion(candidates));
+        return found - candidates.begin();
+    };
+    EXPECT_EQ(pickCompletion({}), nullptr);
+    EXPECT_EQ(pick({{"weather", 1}, {"weather today", 9}}), 0);
+    EXPECT_EQ(pick({{"weather today", 9}, {"weather", 0}}), 1);
+    EXPECT_EQ(pick({{"wea", 1}, {"web", 2}, {"wed", 2}}), 1);
+    EXPECT_EQ(pick({{"wea", 0}, {"web", 0}}), 0);
+    EXPECT_EQ(pick({{"wea", -2}, {"web", -1}}), 0) << "only a positive score counts";
+    EXPECT_EQ(pick({{"wea", -2}, {"web", 1}}), 1);
+    EXPECT_EQ(pick({{"zzzzz", 1}, {"w😀w", 2}, {"wéww", 2}, {"日本語日", 3}}), 3) << "lengths are in UTF-16 units";
+}
+
+struct QueryCacheTest : DaemonTest {
+    QueryCacheTest()
+    {
+        start();
+        deliverBag();
+        cache = QueryCache::make(assembly());
+    }
+    void put(std::string_view input, Dictionary resultSet, double scale = 0)
+    {
+        cache->set(makeSet(input, std::move(resultSet), scale, device.clock.wallNow()));
+        device.drain();
+    }
+    /// The query of the set that answers; empty for none.
+    std::string get(std::string text, double scale = 0)
+    {
+        TAVSearchRequest request;
+        request.queryString = std::move(text);
+        request.scale = scale;
+        const auto set = cache->getRequest(request);
+        return set ? set->query : "";
+    }
+    /// A set whose JSON has this many bytes.
+    static Dictionary sized(std::string query, std::size_t size)
+    {
+        Dictionary set{{"query", std::move(query)}, {"text", ""}};
+        set.set("text", std::string(size - platform::jsonSize(set), 'x'));
+        return set;
+    }
+    std::shared_ptr<QueryCache> cache;
+};
+
+TEST_F(QueryCacheTest, AnswersWhoTypesOn)
+{
+    put("wea", {{"query", "Weather"}});
+    for (const char* text : {"wea", "WEAT", "weather"}) EXPECT_EQ(get(text), "weather") << text;
+    for (const char* text : {"we", "weather ", "wet", ""}) EXPECT_EQ(get(text), "") << text;
+    EXPECT_EQ(cache->get("weat")->input, "wea");
+    put("weath", {{"query", "weather"}});
+    EXPECT_EQ(get("weat"), "") << "the newer set took the place of the other, and more had been typed for it";
+    EXPECT_EQ(cache->count(), 1u);
+}
+
+TEST_F(QueryCacheTest, TakesOnlyWhatCanBeFound)
+{
+    platform::test::LogCapture log;
+    put("weather in", {{"query", "weather"}});
+    EXPECT_TRUE(log.has(platform::LogLevel::Error, "Tavrin_Caching",
+                        "BUG: NOT caching 'weather in' because input is longer than completed query 'weather'"));
+    put("a", {{"query", ""}});
+    put("a", {});
+    put("a", {{"query", std::string("a\0b", 3)}});
+    EXPECT_EQ(cache->count(), 0u);
+    EXPECT_EQ(device.memoryPressure.watchers, 0);
+    EXPECT_EQ(get(std::string("a\0", 2)), "");
+}
+
+TEST_F(QueryCacheTest, ExpiredSetsAreDroppedWhenTheyAreFound)
+{
+    put("w", {{"query", "weather"}, {"max_age", 60}});
+    put("w", {{"query", "web"}});
+    device.advance(59s);
+    EXPECT_EQ(get("weat"), "weather");
+    device.advance(1s);
+    EXPECT_EQ(get("weat"), "");
+    EXPECT_EQ(cache->count(), 1u);
+    device.advance(24h * 365);
+    EXPECT_EQ(get("we"), "web");
+}
+
+TEST_F(QueryCacheTest, KeepsToItsCost)
+{
+    platform::test::LogCapture log;
+    put("a", sized("a", 1398102)); // and half as much again is 2 MiB and one
+    EXPECT_TRUE(log.has(platform::LogLevel::Error, "Tavrin_Caching", "NOT caching 'a' with cost 2097153"));
+    put("b", sized("b", 1398101));
+    EXPECT_EQ(get("b"), "b");
+
+    put("c", sized("c", 699051)); // 1 MiB
+    EXPECT_EQ(get("b"), "") << "cleared for c";
+    put("d", sized("d", 699051));
+    EXPECT_TRUE(get("c").empty() && get("d") == "d");
+    put("e", sized("e", 699050));
+    EXPECT_TRUE(get("d") == "d" && get("e") == "e") << "one byte less than 2 MiB";
+    EXPECT_EQ(log.count("!!! exceeded max cost, flushing cache !!!"), 2);
+
+    cache->removeAllObjects();
+    for (int i = 0; i < 3; ++i) put("f", sized("f", 600'000));
+    EXPECT_EQ(log.count("!!! exceeded max cost, flushing cache !!!"), 3) << "what was replaced still counts";
+}
+
+TEST_F(QueryCacheTest, ChangesOfTheDeviceClearIt)
+{
+    using Change = platform::LocaleSource::Change;
+    const std::pair<const char*, std::function<void()>> changes[]{
+        {"locale", [&] { device.locale.handler(Change::Locale); }},
+        {"time zone", [&] { device.locale.handler(Change::TimeZone); }},
+        {"settings", [&] { device.profile.change({.storefront = "1"}); }},
+        {"GUID", [&] { assembly().guidController->reset(); }},
+        {"country", [&] { device.notifications.post({.name = "TAVCountryCodeChangeNotification"}); }},
+        {"its owner", [&] { cache->removeAllObjects(); }},
+        {"memory pressure", [&] { device.memoryPressure.raise(); }},
+    };
+    for (const auto& [name, change] : changes) {
+        put("w", {{"query", "weather"}});
+        ASSERT_EQ(cache->count(), 1u) << name;
+        ASSERT_EQ(device.memoryPressure.watchers, 1) << name;
+        change();
+        device.drain();
+        EXPECT_EQ(cache->count(), 0u) << name;
+        EXPECT_EQ(device.memoryPressure.watchers, 0) << name;
+    }
+
+    std::vector<std::string> told;
+    const auto token =
+        device.notifications.observe("TAVCountryCodeChangeNotification", [&](auto&) { told.push_back("x"); });
+    device.profile.change({.storefront = "2"});
+    device.profile.change({.countryCode = "CN"});
+    device.locale.handler(Change::Locale);
+    device.drain();
+    EXPECT_EQ(told.size(), 1u) << "the country changed once";
+}
+
+TEST_F(QueryCacheTest, ASetOutlivesTheCache)
+{
+    put("w", {{"query", "weather"}});
+    const auto set = cache->get("weat");
+    cache->removeAllObjects();
+    device.drain();
+    cache.reset();
+    EXPECT_EQ(set->resultSet["query"], Value("weather"));
+    EXPECT_EQ(device.memoryPressure.watchers, 0);
+}
+
+// The rules once more, each spelled out over a plain list.
+struct Model {
+    struct Entry {
+        std::string query, input;
+        double scale, score;
+        std::optional<Date> expires;
+    };
+    std::vector<Entry> entries; // in order of their queries
+    std::size_t cost = 0;
+
+    void put(Entry entry, std::size_t jsonSize)
+    {
+        if (entry.input.size() > entry.query.size()) return;
+        const std::size_t added = jsonSize * 3 / 2;
+        if (added >= 0x200000) return;
+        if (cost + added >= 0x200000) clear();
+        std::erase_if(entries, [&](const Entry& other) { return other.query == entry.query; });
+        entries.push_back(std::move(entry));
+        std::ranges::sort(entries, {}, &Entry::query);
+        cost += added;
+    }
+    void clear()
+    {
+        entries.clear();
+        cost = 0;
+    }
+    /// The identity of the set that answers.
+    std::optional<double> get(const std::string& text, double scale, Date now)
+    {
+        std::erase_if(entries, [&](const Entry& entry) {
+            return entry.query.starts_with(text) && entry.expires && *entry.expires <= now;
+        });
+        const Entry* best = nullptr;
+        for (const Entry& entry : entries) {
+            if (!entry.query.starts_with(text) || text.size() < entry.input.size()) continue;
+            if (scale > 0 && scale != entry.scale) continue;
+            if (best && entry.query.size() > best->query.size()) continue;
+            if (best && entry.query.size() == best->query.size() && entry.score <= std::max(best->score, 0.0)) continue;
+            best = &entry;
+        }
+        return best ? std::optional(best->score) : std::nullopt;
+    }
+};
+
+TEST_F(QueryCacheTest, FollowsItsRulesThroughWhateverHappens)
+{
+    std::mt19937 random(11);
+    const auto upTo = [&](int limit) { return static_cast<int>(random() % static_cast<unsigned>(limit + 1)); };
+    const auto text = [&](int longest) {
+        std::string result;
+        for (int length = 1 + upTo(longest - 1); length > 0; --length) result += static_cast<char>('a' + upTo(2));
+        return result;
+    };
+    Model model;
+    int hits = 0;
+    for (int i = 0; i < 20'000; ++i) {
+        const Date now = device.clock.wallNow();
+        switch (upTo(9)) {
+        case 0:
+            if (upTo(40) > 0) break;
+            model.clear();
+            cache->removeAllObjects();
+            device.drain();
+            break;
+        case 1: device.advance(std::chrono::seconds(upTo(20))); break;
+        case 2:
+        case 3:
+        case 4: {
+            const std::string query = text(6);
+            const std::string input = upTo(20) ? query.substr(0, 1 + upTo(5)) : query + "x";
+            const double scale = upTo(3);
+            const double score = upTo(2) ? upTo(3) + i * 1e-6 : -1 - i * 1e-6; // different for each
+            const int maxAge = upTo(1) ? upTo(60) : 0;
+            Dictionary set = sized(query, upTo(40) ? 200 : 200'000 + static_cast<std::size_t>(upTo(1'400'000)));
+            set.set("completion_score", score);
+            if (maxAge) set.set("max_age", maxAge);
+            const auto expires = maxAge ? std::optional(now + std::chrono::seconds(maxAge)) : std::nullopt;
+            model.put({query, input, scale, static_cast<float>(score), expires}, platform::jsonSize(set));
+            put(input, std::move(set), scale);
+            break;
+        }
+        default: {
+            TAVSearchRequest request;
+            request.queryString = text(7);
+            request.scale = upTo(3);
+            const auto set = cache->getRequest(request);
+            const auto expected = model.get(request.queryString, request.scale, now);
+            ASSERT_EQ(set ? std::optional<double>(set->completionScore) : std::nullopt, expected)
+                << i << ": " << request.queryString << " " << request.scale;
+            hits += set ? 1 : 0;
+        }
+        }
+        ASSERT_EQ(cache->count(), model.entries.size()) << i;
+    }
+    EXPECT_GT(hits, 1000);
+}
+
+TEST_F(QueryCacheTest, ASearchIsAnsweredFromIt)
+{
+    auto connection = client();
+    (void)search(*connection, 1, "weat");
+    const auto uuid = session->last<ZRStartNetworkSearchFeedback>()->uuid;
+    respond(R"([{"status": "OK", "query": "weather"}, {"status": "ERROR", "query": "weathers"}, 7])");
+    const std::size_t before = tasks().size();
+
+    auto hit = search(*connection, 2, "Weathe", {{"verboseReply", true}});
+    ASSERT_TRUE(hit->answered());
+    EXPECT_EQ(hit->argument(1)["rawResponse"].asBytes()->view(), R"([{"status":"OK","query":"weather"}])");
+    EXPECT_NE(hit->argument(1)["httpRequest"]["url"].asString()->find("q=weat&"), std::string::npos);
+    EXPECT_EQ(counter("vistrel.ondevicecachehits"), 1);
+    EXPECT_EQ(session->last<TAVSkipSearchFeedback>()->triggerEvent, SkipSearchTrigger::CacheHit);
+    EXPECT_EQ(session->last<TAVSkipSearchFeedback>()->input, "Weathe");
+    EXPECT_EQ(session->last<TAVSkipSearchFeedback>()->uuid, uuid);
+    EXPECT_EQ(tasks().size(), before);
+
+    const Value item = Value::dictionaryOf({{"class", "TAVQueryItem"}, {"name", "x"}, {"value", "y"}});
+    EXPECT_TRUE(search(*connection, 3, "weathe", {{"queryItems", Value::Array{item}}})->pending())
+        << "items of its own";
+    EXPECT_TRUE(search(*connection, 4, "weathe", {{"scale", 3.0}})->pending()) << "another screen";
+    EXPECT_TRUE(search(*connection, 5, "weathers")->pending()) << "errors aren't kept";
+
+    configure(*connection, "com.quorvane.vistrel", "Vistrel/5");
+    EXPECT_TRUE(search(*connection, 6, "weathe")->pending()) << "a new version of the client asks anew";
+}
+
+TEST_F(QueryCacheTest, CanBeSwitchedOff)
+{
+    device.userDefaults.set("TAVNoQueryCache", true);
+    auto connection = client("com.quorvane.wendral", "Wendral/1");
+    (void)search(*connection, 1, "weat");
+    respond(R"([{"query": "weather"}])");
+    EXPECT_TRUE(search(*connection, 2, "weathe")->pending());
+}
+
+} // namespace
+} // namespace tavrin::test
