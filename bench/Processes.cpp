@@ -3,8 +3,6 @@
 #include <algorithm>
 #include <cstdlib>
 #include <filesystem>
-#include <fstream>
-#include <poll.h>
 
 #include <fmt/format.h>
 
@@ -17,21 +15,6 @@ namespace tavrin::bench {
 
 namespace {
 
-/// The sum of the numbers that follow `key` in a file of /proc, in the unit that it has there.
-std::uint64_t numberIn(const std::filesystem::path& path, std::string_view key)
-{
-    std::ifstream file(path);
-    std::uint64_t sum = 0;
-    for (std::string line; std::getline(file, line);)
-        if (line.starts_with(key)) sum += std::strtoull(line.c_str() + key.size(), nullptr, 10);
-    return sum;
-}
-
-double privateDirtyMegabytes(pid_t pid)
-{
-    return static_cast<double>(numberIn(fmt::format("/proc/{}/smaps_rollup", pid), "Private_Dirty:")) / 1024;
-}
-
 std::uint64_t contextSwitches(pid_t pid)
 {
     std::uint64_t sum = 0;
@@ -39,11 +22,6 @@ std::uint64_t contextSwitches(pid_t pid)
         sum += numberIn(task.path() / "status", "voluntary_ctxt_switches:") +
                numberIn(task.path() / "status", "nonvoluntary_ctxt_switches:");
     return sum;
-}
-
-void pass(double duration)
-{
-    poll(nullptr, 0, static_cast<int>(duration * 1000));
 }
 
 /// A call that needs neither configuration nor bag, on a connection of its own.

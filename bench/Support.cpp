@@ -31,18 +31,45 @@ namespace {
     std::exit(1);
 }
 
+} // namespace
+
 void require(bool holds, const std::string& what)
 {
     if (!holds) die(what);
 }
-
-} // namespace
 
 double now()
 {
     timespec time{};
     clock_gettime(CLOCK_MONOTONIC, &time);
     return static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_nsec) * 1e-9;
+}
+
+double cpu(pid_t pid)
+{
+    clockid_t clock = CLOCK_PROCESS_CPUTIME_ID;
+    timespec time{};
+    require((pid == 0 || clock_getcpuclockid(pid, &clock) == 0) && clock_gettime(clock, &time) == 0, "CPU time");
+    return static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_nsec) * 1e-9;
+}
+
+std::uint64_t numberIn(const std::filesystem::path& path, std::string_view key)
+{
+    std::ifstream file(path);
+    std::uint64_t sum = 0;
+    for (std::string line; std::getline(file, line);)
+        if (line.starts_with(key)) sum += std::strtoull(line.c_str() + key.size(), nullptr, 10);
+    return sum;
+}
+
+double privateDirtyMegabytes(pid_t pid)
+{
+    return static_cast<double>(numberIn(fmt::format("/proc/{}/smaps_rollup", pid), "Private_Dirty:")) / 1024;
+}
+
+void pass(double seconds)
+{
+    poll(nullptr, 0, static_cast<int>(seconds * 1000));
 }
 
 double median(std::vector<double> values)
@@ -147,43 +174,45 @@ int listenAt(const std::string& path)
     return fd;
 }
 
-Daemon::Daemon(const std::string& bagURL, const std::vector<std::string>& environment, const std::string& program)
+Directory::Directory()
 {
     char pattern[] = "/tmp/tavrin-bench-XXXXXX";
     require(mkdtemp(pattern), pattern);
-    _home = pattern;
-    for (const char* name : {"run", "config", "cache", "state"}) std::filesystem::create_directory(_home + "/" + name);
-    std::filesystem::permissions(_home + "/run", std::filesystem::perms::owner_all);
-    _socketPath = _home + "/run/socket";
-    std::ofstream(_home + "/config/com.quorvane.tavrind.json")
-        << platform::toJson(platform::Value::dictionaryOf({{"TAVBagURL", bagURL}}));
+    _path = pattern;
+}
+
+Directory::~Directory()
+{
+    std::error_code ignored;
+    std::filesystem::remove_all(_path, ignored);
+}
+
+Daemon::Daemon(const std::string& bagURL, const std::vector<std::string>& environment, const std::string& program,
+               platform::Dictionary defaults)
+{
+    for (const char* name : {"run", "config", "cache", "state"}) std::filesystem::create_directory(_home / name);
+    std::filesystem::permissions(_home / "run", std::filesystem::perms::owner_all);
+    defaults.set("TAVBagURL", bagURL);
+    std::ofstream(_home / "config/com.quorvane.tavrind.json") << platform::toJson(std::move(defaults));
 
     std::vector<std::string> variables = environment;
-    for (const char* name : {"RUNTIME_DIR=/run", "CONFIG_HOME=/config", "CACHE_HOME=/cache", "STATE_HOME=/state"}) {
-        const std::string text = name;
-        const auto equals = text.find('=');
-        variables.push_back("XDG_" + text.substr(0, equals + 1) + _home + text.substr(equals + 1));
-    }
-    const int socket = listenAt(_socketPath);
+    for (const auto& [variable, name] : {std::pair("XDG_RUNTIME_DIR", "run"), std::pair("XDG_CONFIG_HOME", "config"),
+                                         std::pair("XDG_CACHE_HOME", "cache"), std::pair("XDG_STATE_HOME", "state")})
+        variables.push_back(fmt::format("{}={}", variable, (_home / name).string()));
+    const int socket = listenAt(_home / "run/socket");
     std::vector<std::string> command{program};
     if (program == TAVRIND) command.insert(command.end(), {"--log-level", "fault"});
     _process = std::make_unique<Process>(command, variables, socket);
     close(socket);
 }
 
-Daemon::~Daemon()
-{
-    _process.reset();
-    std::filesystem::remove_all(_home);
-}
-
-std::unique_ptr<TAVClient> Daemon::client(bool withBag) const
+std::unique_ptr<TAVClient> Daemon::client(bool withBag, const std::string& agent) const
 {
     auto client = TAVClient::connect(address());
     require(client.has_value(), "the daemon doesn't answer");
     bool bagArrived = false;
     (*client)->onBagDidLoad([&](const TAVBagAnswer& answer) { bagArrived = bagArrived || answer.bag; });
-    require((*client)->configure({"com.quorvane.bench", "bench/1"}).has_value(), "configure");
+    require((*client)->configure({"com.quorvane.bench", agent}).has_value(), "configure");
     if (withBag) require((*client)->wait([&] { return bagArrived; }, std::chrono::seconds(30)), "no bag");
     (*client)->onBagDidLoad([](const TAVBagAnswer&) {});
     return std::move(*client);

@@ -1,10 +1,13 @@
 #pragma once
 
 #include <atomic>
+#include <cstdint>
+#include <filesystem>
 #include <functional>
 #include <memory>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <sys/types.h>
 #include <thread>
 #include <vector>
@@ -15,7 +18,18 @@ namespace tavrin::bench {
 
 /// Seconds on the monotonic clock.
 [[nodiscard]] double now();
+/// Seconds of CPU, user and system, that all threads of a process have used so far; 0 is this process.
+[[nodiscard]] double cpu(pid_t pid = 0);
 [[nodiscard]] double median(std::vector<double> values);
+
+/// Ends the process with what went wrong, and errno's text, unless `holds`.
+void require(bool holds, const std::string& what);
+
+/// The sum of the numbers that follow `key` in a file of /proc, in the unit that it has there.
+[[nodiscard]] std::uint64_t numberIn(const std::filesystem::path& path, std::string_view key);
+[[nodiscard]] double privateDirtyMegabytes(pid_t pid);
+/// Waits, at no cost.
+void pass(double seconds);
 
 /// One line of the report: a figure of ours beside what it is compared with.
 struct Row {
@@ -39,6 +53,19 @@ class OneCore {
 public:
     OneCore();
     ~OneCore();
+};
+
+/// A private directory, removed with all that is in it.
+class Directory {
+public:
+    Directory();
+    ~Directory();
+    Directory(const Directory&) = delete;
+    Directory& operator=(const Directory&) = delete;
+    [[nodiscard]] std::filesystem::path operator/(const std::string& name) const { return _path / name; }
+
+private:
+    std::filesystem::path _path;
 };
 
 /// A child process; killed when destroyed.
@@ -65,17 +92,16 @@ private:
 /// Private directories and a daemon in them, on a socket of ours. The daemon is `program`, tavrind if not given.
 class Daemon {
 public:
+    /// `defaults` are user defaults beside the bag's URL.
     explicit Daemon(const std::string& bagURL, const std::vector<std::string>& environment = {},
-                    const std::string& program = TAVRIND);
-    ~Daemon();
-    [[nodiscard]] std::string address() const { return "unix:path=" + _socketPath; }
+                    const std::string& program = TAVRIND, platform::Dictionary defaults = {});
+    [[nodiscard]] std::string address() const { return "unix:path=" + (_home / "run/socket").string(); }
     [[nodiscard]] pid_t pid() const { return _process->pid(); }
     /// A client that has configured itself; waits until it has the bag, where `withBag`.
-    [[nodiscard]] std::unique_ptr<TAVClient> client(bool withBag = true) const;
+    [[nodiscard]] std::unique_ptr<TAVClient> client(bool withBag = true, const std::string& agent = "bench/1") const;
 
 private:
-    std::string _home;
-    std::string _socketPath;
+    Directory _home; // outlives the process
     std::unique_ptr<Process> _process;
 };
 
@@ -107,5 +133,10 @@ private:
 [[nodiscard]] std::vector<Row> waiters();
 [[nodiscard]] std::vector<Row> idle();
 [[nodiscard]] std::vector<Row> cacheTree();
+[[nodiscard]] std::vector<Row> append();
+[[nodiscard]] std::vector<Row> archive();
+[[nodiscard]] std::vector<Row> flush();
+[[nodiscard]] std::vector<Row> events();
+[[nodiscard]] std::vector<Row> millionEvents();
 
 } // namespace tavrin::bench

@@ -1,4 +1,3 @@
-#include <algorithm>
 #include <sys/socket.h>
 
 #include <systemd/sd-bus.h>
@@ -26,41 +25,6 @@ ipc::BusMessage newMessage()
     return ipc::BusMessage(message);
 }
 
-/// `value` as it arrives: null entries left out, dates as seconds, texts repaired.
-Value arriving(const Value& value)
-{
-    if (const auto date = value.asDate()) return secondsSince1970(*date);
-    if (const std::string* text = value.asString()) return ipc::busText(*text);
-    if (const Value::Array* array = value.asArray()) {
-        Value::Array elements;
-        for (const Value& element : *array) elements.push_back(arriving(element));
-        return elements;
-    }
-    if (const Dictionary* dictionary = value.asDictionary()) {
-        Dictionary entries;
-        for (const auto& [key, entry] : *dictionary)
-            if (!entry.isNull()) entries.set(ipc::busText(key), arriving(entry));
-        return entries;
-    }
-    return value;
-}
-
-std::size_t depthOf(const Value& value)
-{
-    std::size_t deepest = 0;
-    if (const Value::Array* array = value.asArray())
-        for (const Value& element : *array) deepest = std::max(deepest, depthOf(element) + 1);
-    if (const Dictionary* dictionary = value.asDictionary())
-        for (const auto& [key, entry] : *dictionary) deepest = std::max(deepest, depthOf(entry) + 1);
-    return deepest;
-}
-
-bool hasNullElement(const Value& value)
-{
-    const Value::Array* array = value.asArray();
-    return array && std::ranges::any_of(*array, &Value::isNull);
-}
-
 /// At least this deep a message may nest; the protocol counts variants and entries, too.
 constexpr std::size_t kSafeDepth = 20;
 
@@ -77,14 +41,14 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
     const auto message = newMessage();
     const auto written = ipc::encodeArguments(message.get(), "a{sv}", {.args = {value}, .handles = {}});
     if (!written) {
-        check(!written.error().empty() && (fuzz::anyOf(value, hasNullElement) || depthOf(value) > kSafeDepth),
+        check(!written.error().empty() && (fuzz::anyOf(value, fuzz::hasNullElement) || fuzz::depthOf(value) > kSafeDepth),
               written.error());
         return 0;
     }
     check(sd_bus_message_seal(message.get(), 1, 0) >= 0);
     const auto read = ipc::decodeArguments(message.get(), SIZE_MAX);
     check(read.has_value(), read ? "" : read.error().message);
-    check(read->message.args.size() == 1 && read->message.args[0] == arriving(value), toJson(value));
+    check(read->message.args.size() == 1 && read->message.args[0] == fuzz::arriving(value), toJson(value));
 
     const auto isRepaired = [](const Value& text) {
         return text.asString() && ipc::busText(*text.asString()) != *text.asString();

@@ -30,10 +30,13 @@ struct Device : platform::test::TestDevice {
         daemon = startUp(device).value();
         drain();
         connection = ipc.connect("com.quorvane.TAVDaemonXPC");
-        connection->call("Configure", {Value::dictionaryOf({{"class", "TAVSessionConfiguration"},
-                                                            {"identifier", "com.example.app"},
-                                                            {"userAgent", "Example/1"}})});
         drain();
+        const auto configured =
+            connection->call("Configure", {Value::dictionaryOf({{"class", "TAVSessionConfiguration"},
+                                                                {"identifier", "com.example.app"},
+                                                                {"userAgent", "Example/1"}})});
+        drain();
+        check(configured->answered());
         flushSession();
         takeSessions();
     }
@@ -96,7 +99,6 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
             const auto* end = dynamic_cast<const TavrinSessionEndFeedback*>(event->feedback.get());
             if (!custom && !end) kept.push_back(platform::archive(*event->feedback));
         }
-        for (const auto& event : session->feedbacks()) std::fprintf(stderr, "%s\n", event->description().c_str());
         fuzz::checkUpload(*session);
     }
     std::ranges::sort(expected);

@@ -6,6 +6,7 @@
 #include <string>
 #include <string_view>
 
+#include "platform/BusMessage.h"
 #include "platform/Value.h"
 
 /// Help for fuzz targets whose input is a JSON text that stands for a richer value.
@@ -37,6 +38,42 @@ inline Value enriched(const Value& value)
         return entries;
     }
     return value;
+}
+
+/// `value` as it arrives over the bus: null entries left out, dates as seconds, texts repaired.
+inline Value arriving(const Value& value)
+{
+    if (const auto date = value.asDate()) return platform::secondsSince1970(*date);
+    if (const std::string* text = value.asString()) return platform::ipc::busText(*text);
+    if (const Value::Array* array = value.asArray()) {
+        Value::Array elements;
+        for (const Value& element : *array) elements.push_back(arriving(element));
+        return elements;
+    }
+    if (const platform::Dictionary* dictionary = value.asDictionary()) {
+        platform::Dictionary entries;
+        for (const auto& [key, entry] : *dictionary)
+            if (!entry.isNull()) entries.set(platform::ipc::busText(key), arriving(entry));
+        return entries;
+    }
+    return value;
+}
+
+inline std::size_t depthOf(const Value& value)
+{
+    std::size_t deepest = 0;
+    if (const Value::Array* array = value.asArray())
+        for (const Value& element : *array) deepest = std::max(deepest, depthOf(element) + 1);
+    if (const platform::Dictionary* dictionary = value.asDictionary())
+        for (const auto& [key, entry] : *dictionary) deepest = std::max(deepest, depthOf(entry) + 1);
+    return deepest;
+}
+
+/// Such an array can't travel.
+inline bool hasNullElement(const Value& value)
+{
+    const Value::Array* array = value.asArray();
+    return array && std::ranges::any_of(*array, &Value::isNull);
 }
 
 /// Whether `leaf` holds for every value of two trees that have the same arrays, keys and leaves.

@@ -42,7 +42,8 @@ TEST_F(MemoryPressureTest, IsWatchedOnlyWhileSomeoneAsks)
     int first = 0;
     int second = 0;
     auto one = pressure->watch([&] { ++first; });
-    auto two = pressure->watch([&] {
+    decltype(one) two;
+    two = pressure->watch([&] {
         ++second;
         two.reset(); // as a cache does that has nothing left to give up
     });

@@ -1,0 +1,65 @@
+#include <array>
+#include <bit>
+
+#include "fuzz/Sessions.h"
+#include "platform/Counters.h"
+#include "platform/Log.h"
+#include "platform/Record.h"
+#include "platform/Transactions.h"
+#include "tavrind/ClientSessionHeader.h"
+#include "tavrind/FileContainer.h"
+#include "tavrind/TavrinDiagnosticDataReporter.h"
+#include "tavrind/TavrinFeedback.h"
+#include "tests/support/ManualClock.h"
+#include "tests/support/ManualExecutor.h"
+#include "tests/support/MemoryFiles.h"
+
+using namespace tavrin;
+
+namespace {
+
+constexpr const char* kFile = "/session.1";
+
+std::string framed(std::string_view archive)
+{
+    const auto length = std::bit_cast<std::array<char, 8>>(std::uint64_t{archive.size()});
+    return std::string(length.data(), length.size()).append(archive);
+}
+
+/// Reads a file that an earlier process left, as it is found, and checks what is made of it.
+void readFile(std::string contents)
+{
+    platform::test::ManualExecutor executor;
+    platform::test::ManualClock clock;
+    platform::test::MemoryFiles files;
+    platform::Transactions transactions;
+    platform::CounterStore counters;
+    TavrinDiagnosticDataReporter diagnosticData(counters);
+    const auto queue = platform::Queue::make("storage", platform::Queue::Kind::Serial, executor, clock);
+    FeedbackBooks books(files, "/books.json", queue);
+    const auto store = std::make_shared<const FileContainerStore>(FileContainerStore{
+        files, transactions, diagnosticData, books, queue, "tavrind/1", 4u << 20});
+
+    files.files[kFile] = std::move(contents);
+    const std::uint64_t count = FileContainer::countFeedback(*store, kFile);
+    books.find(FeedbackFate::Closed, count);
+    const auto session = std::make_shared<FileContainer>(store, kFile, count)->read();
+    const std::size_t events = session ? session->recordedEvents() : 0;
+    check(books.count(FeedbackFate::Closed) == static_cast<std::int64_t>(events), platform::toJson(books.description()));
+    fuzz::checkBooks(books);
+    if (!session) return;
+    for (const auto& event : session->feedbacks()) (void)event->description();
+    fuzz::checkUpload(*session);
+}
+
+} // namespace
+
+/// The input is a session file; and it is what a file has behind its head, as the archive of one event.
+int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
+{
+    platform::Log::threshold = platform::LogLevel::Fault;
+    const std::string_view input = textOf(data, size);
+    readFile(std::string(input));
+    readFile(framed(platform::archiveValue("tavrind/1")) + framed(platform::archive(ClientSessionHeader())) + framed(input));
+    return 0;
+}

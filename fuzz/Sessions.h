@@ -1,0 +1,45 @@
+#pragma once
+
+#include "fuzz/Check.h"
+#include "platform/Error.h"
+#include "platform/Value.h"
+#include "tavrind/FeedbackBooks.h"
+#include "tavrind/OutputStream.h"
+#include "tavrind/StoredSession.h"
+#include "tavrind/TavrinFeedbackFlusher.h"
+
+namespace fuzz {
+
+/// Checks what would be uploaded of a session: JSON text with every event, and at the end what they refer to.
+inline void checkUpload(tavrin::StoredSession& session)
+{
+    constexpr std::size_t kKindsOfMissing = 2; // results and suggestions
+    const std::size_t events = session.recordedEvents();
+    tavrin::FeedbacksToSend feedbacks = session.getFeedbacksToSend();
+    const std::size_t keys = feedbacks.count();
+    tavrin::MemoryOutputStream stream;
+    stream.open();
+    check(tavrin::writeJson(feedbacks, stream));
+
+    const auto json = platform::parseJson(stream.contents());
+    if (!json) return check(json.error().reason().starts_with("nested deeper"), json.error().description());
+    check(json->count() == keys, stream.contents());
+    const platform::Value::Array& sent = *(*json)["fb"].asArray();
+    check(sent.size() >= events && sent.size() <= events + kKindsOfMissing, std::to_string(sent.size()));
+    for (const platform::Value& event : sent)
+        check(event["type"].asString() && event["timestamp"].asUInt(), platform::toJson(event));
+}
+
+/// Checks that every event is in exactly one place.
+inline void checkBooks(const tavrin::FeedbackBooks& books)
+{
+    std::int64_t sum = 0;
+    for (std::size_t fate = 0; fate < tavrin::kFeedbackFates; ++fate) {
+        const std::int64_t events = books.count(static_cast<tavrin::FeedbackFate>(fate));
+        check(events >= 0, platform::toJson(books.description()));
+        sum += events;
+    }
+    check(books.recorded() == sum, platform::toJson(books.description()));
+}
+
+} // namespace fuzz
