@@ -52,6 +52,13 @@ icu::UnicodeString unicode(std::string_view text)
     return icu::UnicodeString::fromUTF8(icu::StringPiece(text.data(), static_cast<int32_t>(text.size())));
 }
 
+/// A name that is none stands for no language at all.
+icu::Locale localeOf(const std::string& name)
+{
+    const icu::Locale locale(name.c_str());
+    return locale.isBogus() ? icu::Locale::getRoot() : locale;
+}
+
 } // namespace
 
 std::string_view trimmed(std::string_view text)
@@ -75,7 +82,7 @@ std::vector<std::string> wordsIn(std::string_view text, const std::string& local
 {
     UErrorCode status = U_ZERO_ERROR;
     const std::unique_ptr<icu::BreakIterator> iterator(
-        icu::BreakIterator::createWordInstance(icu::Locale(locale.c_str()), status));
+        icu::BreakIterator::createWordInstance(localeOf(locale), status));
     if (U_FAILURE(status)) return {};
     const icu::UnicodeString whole = unicode(text);
     iterator->setText(whole);
@@ -96,7 +103,7 @@ LocalizedSearch::LocalizedSearch(std::string_view text, const std::string& local
 {
     UErrorCode status = U_ZERO_ERROR;
     _impl->text = unicode(text);
-    _impl->collator.reset(icu::Collator::createInstance(icu::Locale(locale.c_str()), status));
+    _impl->collator.reset(icu::Collator::createInstance(localeOf(locale), status));
     if (_impl->collator) _impl->collator->setStrength(icu::Collator::SECONDARY); // accents count, case doesn't
 }
 

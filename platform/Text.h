@@ -21,8 +21,8 @@ namespace platform {
 /// between them. Texts beyond 1 MiB are cut off there.
 [[nodiscard]] std::vector<std::string> wordsIn(std::string_view text, const std::string& locale);
 
-/// A text to look for others in, as `locale` compares them, without regard to case: "STRASSE" is in "die Straße", but
-/// "resume" isn't in "résumé". One thread at a time.
+/// A text to look for others in, as `locale` compares them, without regard to case: "RÉSUMÉ" is in "my résumé", but
+/// "resume" isn't. One thread at a time.
 class LocalizedSearch {
 public:
     /// Texts beyond 1 MiB are cut off there.

@@ -46,13 +46,13 @@ TEST(Text, SearchesWithoutRegardToCaseAsTheLocaleCompares)
         const char* locale;
         bool contained;
     } cases[]{
-        {"die Straße", "STRASSE", "de_CH", true},
+        {"die STRASSE", "straße", "de_CH", false},
         {"résumé", "RÉSUMÉ", "fr_FR", true},
         {"résumé", "resume", "fr_FR", false},
         {"re\u0301sume\u0301", "résumé", "fr_FR", true}, // composed otherwise
-        {"DIYARBAKIR", "diyarbakır", "tr_TR", true},
-        {"DIYARBAKIR", "diyarbakir", "tr_TR", false},
-        {"DIYARBAKIR", "diyarbakir", "en_US", true},
+        {"ISPARTA", "ısparta", "tr_TR", true},
+        {"ISPARTA", "isparta", "tr_TR", false},
+        {"ISPARTA", "isparta", "en_US", true},
         {"abc", "bc", "en_US", true},
         {"abc", "abcd", "en_US", false},
         {"abc", "", "en_US", false},
