@@ -1,38 +1,42 @@
 #include <algorithm>
-#include <array>
+#include <arpa/inet.h>
 #include <atomic>
 #include <cerrno>
-#include <cstdlib>
-#include <map>
+#include <cmath>
+#include <cstring>
+#include <deque>
 #include <mutex>
-#include <span>
-#include <sys/epoll.h>
-#include <sys/eventfd.h>
-#include <sys/timerfd.h>
+#include <sys/stat.h>
 #include <thread>
 #include <unistd.h>
 #include <vector>
 
 #include <curl/curl.h>
+#include <fmt/format.h>
+#include <openssl/ssl.h>
 
-#include "platform/CurlTask.h"
-#include "platform/Files.h"
+#include "platform/CurlSupport.h"
+#include "platform/Queue.h"
 #include "platform/ThreadName.h"
+#include "platform/UrlSession.h"
 
 namespace platform {
 
 namespace {
 
-/// The transfers: one libcurl multi handle, and the URL-loading thread, which waits for their sockets and timers.
-/// Nothing is handed over where it needn't be: a thread that starts a load sends the request itself while the multi
-/// handle is free, and the loading thread runs a completion itself when nothing else is under way.
-class Loader final : public CurlTaskRunner {
-public:
-    Loader();
-    ~Loader() override;
+/// Of one load, over all its hops. libcurl refuses a single line beyond 100 KiB.
+constexpr std::size_t kMaximumHeaderSize = 256u << 10;
 
-    void start(std::shared_ptr<CurlTask> task) override { giveCommand(std::move(task), false); }
-    void cancel(std::shared_ptr<CurlTask> task) override { giveCommand(std::move(task), true); }
+class CurlTask;
+
+/// The URL-loading thread. Everything with "loader thread" in its comment belongs to it alone.
+class Loader : public std::enable_shared_from_this<Loader> {
+public:
+    Loader() : _multi(curl_multi_init()) {}
+    ~Loader();
+
+    void start(std::shared_ptr<CurlTask> task);
+    void cancel(std::shared_ptr<CurlTask> task);
     /// Ends every task and the thread.
     void stop();
 
@@ -41,56 +45,382 @@ private:
         std::shared_ptr<CurlTask> task;
         bool cancel;
     };
-    using Time = std::chrono::steady_clock::time_point;
-
     void run();
-    void wake();
-    void giveCommand(std::shared_ptr<CurlTask> task, bool cancel);
-    // With the multi handle held.
-    void work(std::span<const epoll_event> events);
     void takeCommands();
     void begin(const std::shared_ptr<CurlTask>& task);
     void end(CURL* easy, CURLcode code, bool cancelled);
-    void endLate();
-    void endFinished();
-    void setTimer();
-    [[nodiscard]] long curlTimeout() const;
-    void watchSocket(curl_socket_t socket, int what);
     [[nodiscard]] CURL* takeEasy();
+    [[nodiscard]] int nextTimeout();
 
-    const FileHandle _epoll;
-    const FileHandle _timer; // for the earliest of what curl and the tasks wait for
-    const FileHandle _wake;  // for commands that found the multi handle held, and for the end
-
-    std::mutex _multiMutex; // held by whoever works on what follows
     CURLM* _multi;
-    std::map<CURL*, std::shared_ptr<CurlTask>> _active;
-    std::vector<CURL*> _spare;
-    std::vector<std::pair<std::shared_ptr<CurlTask>, Queue::Task>> _ended; // and the call that hands each on
-    std::optional<Time> _timerSetTo;
-
     std::mutex _mutex;
-    std::vector<Command> _commands; // under the mutex, like the rest
-    bool _stopping = false;
-    std::thread _thread; // made with the first task
+    std::vector<Command> _commands;                     // under the mutex
+    bool _stopping = false;                             // under the mutex
+    std::thread _thread;                                // made under the mutex
+    std::map<CURL*, std::shared_ptr<CurlTask>> _active; // loader thread
+    std::vector<CURL*> _spare;                          // loader thread
 };
 
-Loader::Loader()
-    : _epoll(epoll_create1(EPOLL_CLOEXEC)), _timer(timerfd_create(CLOCK_MONOTONIC, TFD_CLOEXEC | TFD_NONBLOCK)),
-      _wake(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)), _multi(curl_multi_init())
-{
-    // Edge-triggered: the counters need no reading.
-    for (const int fd : {_timer.fd(), _wake.fd()}) {
-        epoll_event event{.events = EPOLLIN | EPOLLET, .data = {.fd = fd}};
-        if (epoll_ctl(_epoll.fd(), EPOLL_CTL_ADD, fd, &event) != 0)
-            std::abort(); // no descriptors: nothing can be loaded
+/// One load. The loader thread fills it in; the completion hands the results on.
+class CurlTask final : public UrlTask, public std::enable_shared_from_this<CurlTask> {
+public:
+    CurlTask(std::shared_ptr<Loader> loader, std::uint64_t identifier, UrlRequest request,
+             UrlSessionConfiguration configuration, UrlSession::DataCompletion completion,
+             std::shared_ptr<Queue> delegateQueue, std::optional<TransferFiles> files = std::nullopt)
+        : _loader(std::move(loader)), _identifier(identifier), _request(std::move(request)),
+          _configuration(std::move(configuration)), _completion(std::move(completion)),
+          _delegateQueue(std::move(delegateQueue)), _files(std::move(files))
+    {}
+    ~CurlTask() override { curl_slist_free_all(_headerList); }
+
+    void resume() override
+    {
+        if (!_started.exchange(true)) _loader->start(shared_from_this());
     }
-    curl_multi_setopt(_multi, CURLMOPT_SOCKETDATA, this);
-    curl_multi_setopt(
-        _multi, CURLMOPT_SOCKETFUNCTION, +[](CURL*, curl_socket_t socket, int what, void* self, void*) {
-            static_cast<Loader*>(self)->watchSocket(socket, what);
-            return 0;
+    void cancel() override
+    {
+        _cancelled = true;
+        if (_started.exchange(true))
+            _loader->cancel(shared_from_this());
+        else
+            complete(CURLE_OK, true);
+    }
+    /// True for a task that was cancelled before the loader began it.
+    [[nodiscard]] bool cancelled() const { return _cancelled; }
+    [[nodiscard]] std::uint64_t identifier() const override { return _identifier; }
+    [[nodiscard]] const UrlRequest& originalRequest() const override { return _request; }
+    [[nodiscard]] Value timingData() const override
+    {
+        std::lock_guard lock(_timingMutex);
+        return _timing;
+    }
+
+    /// Sets the transfer up. Loader thread, like all below.
+    [[nodiscard]] bool configure(CURL* handle);
+    void complete(CURLcode code, bool cancelled);
+    [[nodiscard]] CURL* easy() const { return _easy; }
+
+    /// Milliseconds until the task times out for having received nothing; none while it isn't sent.
+    [[nodiscard]] std::chrono::milliseconds timeLeft(std::chrono::steady_clock::time_point now) const
+    {
+        return std::chrono::ceil<std::chrono::milliseconds>(_lastProgress + timeout() - now);
+    }
+    bool timedOut = false;
+
+private:
+    [[nodiscard]] Duration timeout() const { return _request.timeout.value_or(_configuration.requestTimeout); }
+    void progressed() { _lastProgress = std::chrono::steady_clock::now(); }
+    std::size_t received(std::string_view bytes);
+    bool store(std::string_view bytes);
+    void forgetBody();
+    std::size_t receivedHeader(std::string_view line);
+    [[nodiscard]] bool configureUpload();
+    std::size_t readUpload(char* buffer, std::size_t size);
+    int mayConnect(const char* address);
+    [[nodiscard]] long hop() const;
+    void noteMarks();
+    [[nodiscard]] Error unsupported() const;
+
+    std::shared_ptr<Loader> _loader;
+    const std::uint64_t _identifier;
+    const UrlRequest _request;
+    const UrlSessionConfiguration _configuration;
+    UrlSession::DataCompletion _completion;
+    std::shared_ptr<Queue> _delegateQueue;
+    const std::optional<TransferFiles> _files;
+    std::atomic<bool> _started = false; // handed to the loader, or ended without it
+    std::atomic<bool> _cancelled = false;
+
+    CURL* _easy = nullptr;
+    curl_slist* _headerList = nullptr;
+    std::chrono::steady_clock::time_point _lastProgress;
+    double _start = 0; // on the monotonic clock
+    std::string _body;
+    std::size_t _bodySize = 0; // what was received, whether it is in memory or not
+    std::uint64_t _uploaded = 0;
+    std::uint64_t _uploadSize = 0;
+    int _fileError = 0; // errno
+    HttpHeaders _headers;
+    std::size_t _headerSize = 0; // of all hops
+    bool _tooLarge = false;
+    std::optional<long> _sentHop; // the last hop whose request was sent
+    long _markedHop = 0;
+    TransferMarks _marks;       // by the end of that hop
+    TransferMarks _earlierHops; // by the end of the one before
+    std::optional<bool> _firstHopPublic;
+    bool _forbiddenHop = false;
+    std::array<char, CURL_ERROR_SIZE> _errorText{};
+
+    mutable std::mutex _timingMutex;
+    Value _timing; // under the mutex
+};
+
+std::size_t CurlTask::received(std::string_view bytes)
+{
+    progressed();
+    if (_bodySize + bytes.size() > _configuration.maximumResponseSize) {
+        _tooLarge = true;
+        return 0;
+    }
+    if (_files) {
+        if (!store(bytes)) return 0;
+    } else {
+        if (_body.empty()) {
+            curl_off_t length = -1;
+            curl_easy_getinfo(_easy, CURLINFO_CONTENT_LENGTH_DOWNLOAD_T, &length);
+            const auto expected = static_cast<std::size_t>(std::max<curl_off_t>(length, 0));
+            _body.reserve(std::min(expected, _configuration.maximumResponseSize));
+        }
+        _body.append(bytes);
+    }
+    _bodySize += bytes.size();
+    return bytes.size();
+}
+
+bool CurlTask::store(std::string_view bytes)
+{
+    if (!_files->download) return true;
+    for (std::size_t written = 0; written < bytes.size();) {
+        const ssize_t count = pwrite(_files->download.fd(), bytes.data() + written, bytes.size() - written,
+                                     static_cast<off_t>(_bodySize + written));
+        if (count < 0 && errno != EINTR) {
+            _fileError = errno;
+            return false;
+        }
+        if (count > 0) written += static_cast<std::size_t>(count);
+    }
+    return true;
+}
+
+/// The body of a redirect isn't the answer's.
+void CurlTask::forgetBody()
+{
+    _body.clear();
+    if (_bodySize > 0 && _files && _files->download && ftruncate(_files->download.fd(), 0) != 0) _fileError = errno;
+    _bodySize = 0;
+}
+
+std::size_t CurlTask::readUpload(char* buffer, std::size_t size)
+{
+    progressed();
+    ssize_t count = -1;
+    do count = pread(_files->upload.fd(), buffer, size, static_cast<off_t>(_uploaded));
+    while (count < 0 && errno == EINTR);
+    // A file that became shorter must not be sent as if it were whole.
+    if (count < 0 || (count == 0 && size > 0 && _uploaded < _uploadSize)) {
+        _fileError = count < 0 ? errno : EIO;
+        return CURL_READFUNC_ABORT;
+    }
+    _uploaded += static_cast<std::uint64_t>(count);
+    if (_files->progress && count > 0) _files->progress(_uploaded, _uploadSize);
+    return static_cast<std::size_t>(count);
+}
+
+std::size_t CurlTask::receivedHeader(std::string_view line)
+{
+    progressed();
+    _headerSize += line.size();
+    if (_headerSize > kMaximumHeaderSize) {
+        _tooLarge = true;
+        return 0;
+    }
+    if (line.starts_with("HTTP/")) {
+        noteMarks();
+        _headers = {}; // of a redirect, or of an interim answer
+        forgetBody();
+        return line.size();
+    }
+    const std::size_t colon = line.find(':');
+    if (colon == std::string_view::npos) return line.size();
+    std::string_view value = line.substr(colon + 1);
+    const auto isBlank = [](char c) { return c == ' ' || c == '\t' || c == '\r' || c == '\n'; };
+    while (!value.empty() && isBlank(value.front())) value.remove_prefix(1);
+    while (!value.empty() && isBlank(value.back())) value.remove_suffix(1);
+    _headers.add(std::string(line.substr(0, colon)), std::string(value));
+    return line.size();
+}
+
+long CurlTask::hop() const
+{
+    long redirects = 0;
+    curl_easy_getinfo(_easy, CURLINFO_REDIRECT_COUNT, &redirects);
+    return redirects;
+}
+
+/// libcurl adds up the marks of all hops; what the earlier ones took is kept, to be subtracted.
+void CurlTask::noteMarks()
+{
+    if (const long now = hop(); now != _markedHop) {
+        _markedHop = now;
+        _earlierHops = _marks;
+    }
+    _marks = transferMarks(_easy);
+}
+
+/// libcurl has one code for three faults.
+Error CurlTask::unsupported() const
+{
+    if (!_sentHop) return urlErrorFromCurl(CURLE_UNSUPPORTED_PROTOCOL, _errorText.data());
+    if (hop() > *_sentHop)
+        return urlError(kUrlForbiddenRedirect, fmt::format("redirected to another scheme: {}", _errorText.data()));
+    return urlError(kUrlBadResponse, fmt::format("the answer isn't HTTP: {}", _errorText.data()));
+}
+
+/// A public host must not lead us, by a redirect, to an address of the inner network.
+int CurlTask::mayConnect(const char* address)
+{
+    _sentHop = hop();
+    const bool isPublic = isPublicAddress(address);
+    if (!_firstHopPublic) _firstHopPublic = isPublic;
+    _forbiddenHop = *_firstHopPublic && !isPublic;
+    return _forbiddenHop ? CURL_PREREQFUNC_ABORT : CURL_PREREQFUNC_OK;
+}
+
+bool CurlTask::configureUpload()
+{
+    struct stat status {};
+    if (fstat(_files->upload.fd(), &status) != 0) {
+        _fileError = errno;
+        return false;
+    }
+    _uploadSize = static_cast<std::uint64_t>(status.st_size);
+    curl_easy_setopt(_easy, CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(_uploadSize));
+    curl_easy_setopt(_easy, CURLOPT_READDATA, this);
+    curl_easy_setopt(
+        _easy, CURLOPT_READFUNCTION, +[](char* buffer, std::size_t size, std::size_t count, void* self) {
+            return static_cast<CurlTask*>(self)->readUpload(buffer, size * count);
         });
+    // From its start, for a redirect that repeats the body and for a connection that turned out to be closed.
+    curl_easy_setopt(_easy, CURLOPT_SEEKDATA, this);
+    curl_easy_setopt(
+        _easy, CURLOPT_SEEKFUNCTION, +[](void* self, curl_off_t offset, int origin) {
+            if (origin != SEEK_SET || offset < 0) return CURL_SEEKFUNC_FAIL;
+            static_cast<CurlTask*>(self)->_uploaded = static_cast<std::uint64_t>(offset);
+            return CURL_SEEKFUNC_OK;
+        });
+    return true;
+}
+
+bool CurlTask::configure(CURL* handle)
+{
+    _easy = handle;
+    _start = monotonicSeconds();
+    progressed();
+    const auto set = [handle](CURLoption option, auto value) {
+        return curl_easy_setopt(handle, option, value) == CURLE_OK;
+    };
+
+    set(CURLOPT_ERRORBUFFER, _errorText.data());
+    set(CURLOPT_NOSIGNAL, 1L);
+    set(CURLOPT_PROTOCOLS_STR, "http,https");
+    set(CURLOPT_REDIR_PROTOCOLS_STR, "http,https");
+    set(CURLOPT_FOLLOWLOCATION, 1L);
+    set(CURLOPT_MAXREDIRS, static_cast<long>(_configuration.maximumRedirects));
+    set(CURLOPT_HTTP_VERSION, static_cast<long>(CURL_HTTP_VERSION_2TLS));
+    set(CURLOPT_PIPEWAIT, _configuration.pipelining ? 1L : 0L);
+    set(CURLOPT_TCP_FASTOPEN, _configuration.allowFastOpenAndTickets ? 1L : 0L);
+    set(CURLOPT_SSL_SESSIONID_CACHE, _configuration.allowFastOpenAndTickets ? 1L : 0L);
+    set(CURLOPT_ACCEPT_ENCODING, "");
+    if (_configuration.connectionPurgeTimeout)
+        set(CURLOPT_MAXAGE_CONN, static_cast<long>(toSeconds(*_configuration.connectionPurgeTimeout)));
+    if (!_configuration.caFile.empty()) set(CURLOPT_CAINFO, _configuration.caFile.c_str());
+    if (_configuration.allowFastOpenAndTickets) {
+        // libcurl switches session tickets off; they save a round trip on every new connection.
+        set(
+            CURLOPT_SSL_CTX_FUNCTION, +[](CURL*, void* context, void*) -> CURLcode {
+                SSL_CTX_clear_options(static_cast<SSL_CTX*>(context), SSL_OP_NO_TICKET);
+                return CURLE_OK;
+            });
+    }
+    set(CURLOPT_WRITEDATA, this);
+    set(
+        CURLOPT_WRITEFUNCTION, +[](char* data, std::size_t, std::size_t count, void* self) {
+            return static_cast<CurlTask*>(self)->received({data, count});
+        });
+    set(CURLOPT_HEADERDATA, this);
+    set(
+        CURLOPT_HEADERFUNCTION, +[](char* data, std::size_t, std::size_t count, void* self) {
+            return static_cast<CurlTask*>(self)->receivedHeader({data, count});
+        });
+    set(CURLOPT_PREREQDATA, this);
+    set(
+        CURLOPT_PREREQFUNCTION,
+        +[](void* self, char* address, char*, int, int) { return static_cast<CurlTask*>(self)->mayConnect(address); });
+
+    for (const auto& [name, value] : _request.headers) {
+        // "Name;" is how libcurl is told to send an empty field.
+        const std::string line = value.empty() ? name + ";" : name + ": " + value;
+        if (line.find_first_of("\r\n") != std::string::npos) continue;
+        curl_slist* extended = curl_slist_append(_headerList, line.c_str());
+        if (extended) _headerList = extended;
+    }
+    const bool hasUpload = _files && _files->upload;
+    const bool hasBody = hasUpload || !_request.body.empty() || _request.method == "POST";
+    if (hasBody) {
+        set(CURLOPT_POST, 1L);
+        if (hasUpload) {
+            if (!configureUpload()) return false;
+        } else {
+            set(CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(_request.body.size()));
+            set(CURLOPT_POSTFIELDS, _request.body.empty() ? "" : _request.body.data());
+        }
+        curl_slist* extended = curl_slist_append(_headerList, "Expect:");
+        if (extended) _headerList = extended;
+    }
+    if (_request.method == "HEAD") set(CURLOPT_NOBODY, 1L);
+    // Only where it must be: libcurl keeps to a method that was forced, even where a redirect turns POST into GET.
+    else if (_request.method != (hasBody ? "POST" : "GET"))
+        set(CURLOPT_CUSTOMREQUEST, _request.method.c_str());
+    set(CURLOPT_HTTPHEADER, _headerList);
+    return set(CURLOPT_URL, _request.url.string().c_str());
+}
+
+void CurlTask::complete(CURLcode code, bool cancelled)
+{
+    std::optional<UrlResponse> response;
+    std::optional<Bytes> data;
+    std::optional<Error> error;
+
+    if (cancelled)
+        error = urlError(kUrlCancelled, "cancelled");
+    else if (timedOut)
+        error = urlError(kUrlTimedOut, fmt::format("nothing received for {:g} s", toSeconds(timeout())));
+    else if (_tooLarge)
+        error = urlError(kUrlTooLarge, _headerSize > kMaximumHeaderSize
+                                           ? fmt::format("more than {} bytes of header fields", kMaximumHeaderSize)
+                                           : fmt::format("more than {} bytes", _configuration.maximumResponseSize));
+    else if (_forbiddenHop)
+        error = urlError(kUrlForbiddenRedirect, "redirected to a private address");
+    else if (_fileError != 0)
+        error = Error::posix(_fileError, "a transfer's file");
+    else if (code == CURLE_UNSUPPORTED_PROTOCOL)
+        error = unsupported();
+    else if (code != CURLE_OK)
+        error = urlErrorFromCurl(code, _errorText.data());
+
+    if (_easy && !cancelled) {
+        long status = 0;
+        char* url = nullptr;
+        curl_easy_getinfo(_easy, CURLINFO_RESPONSE_CODE, &status);
+        curl_easy_getinfo(_easy, CURLINFO_EFFECTIVE_URL, &url);
+        if (status > 0) {
+            response = UrlResponse{.url = url ? Url::parse(url).value_or(_request.url) : _request.url,
+                                   .isHttp = true,
+                                   .statusCode = static_cast<int>(status),
+                                   .headers = std::move(_headers)};
+        }
+        noteMarks();
+        std::lock_guard lock(_timingMutex);
+        _timing = timingDataOf(_easy, _start, _earlierHops);
+    }
+    if (!error) data = Bytes(std::move(_body));
+    _easy = nullptr;
+    _delegateQueue->async([self = shared_from_this(), data = std::move(data), response = std::move(response),
+                           error = std::move(error)]() mutable {
+        // Moved out first: the completion may be what keeps the task's owner alive.
+        auto completion = std::exchange(self->_completion, {});
+        completion(std::move(data), std::move(response), std::move(error));
+    });
 }
 
 Loader::~Loader()
@@ -99,30 +429,27 @@ Loader::~Loader()
     curl_multi_cleanup(_multi);
 }
 
-void Loader::wake()
-{
-    const std::uint64_t one = 1;
-    if (write(_wake.fd(), &one, sizeof one) < 0) std::abort(); // only a counter at its limit fails
-}
-
-void Loader::giveCommand(std::shared_ptr<CurlTask> task, bool cancel)
+void Loader::start(std::shared_ptr<CurlTask> task)
 {
     {
-        std::unique_lock lock(_mutex);
-        if (_stopping) {
-            lock.unlock();
-            if (!cancel) task->deliver(task->completion(CURLE_OK, true));
-            return;
+        std::lock_guard lock(_mutex);
+        if (!_stopping) {
+            _commands.push_back({std::move(task), false});
+            if (!_thread.joinable()) _thread = std::thread([this] { run(); });
         }
-        _commands.push_back({std::move(task), cancel});
-        if (!_thread.joinable()) _thread = std::thread([this] { run(); });
     }
-    std::unique_lock multi(_multiMutex, std::try_to_lock);
-    if (!multi) return wake();
-    work({});
-    auto ended = std::exchange(_ended, {});
-    multi.unlock();
-    for (auto& [which, completion] : ended) which->deliver(std::move(completion));
+    if (task) return task->complete(CURLE_OK, true);
+    curl_multi_wakeup(_multi);
+}
+
+void Loader::cancel(std::shared_ptr<CurlTask> task)
+{
+    {
+        std::lock_guard lock(_mutex);
+        if (_stopping) return;
+        _commands.push_back({std::move(task), true});
+    }
+    curl_multi_wakeup(_multi);
 }
 
 void Loader::stop()
@@ -132,7 +459,7 @@ void Loader::stop()
         _stopping = true;
         if (!_thread.joinable()) return;
     }
-    wake();
+    curl_multi_wakeup(_multi);
     _thread.join();
 }
 
@@ -161,10 +488,10 @@ void Loader::takeCommands()
 
 void Loader::begin(const std::shared_ptr<CurlTask>& task)
 {
-    if (task->cancelled()) return _ended.push_back({task, task->completion(CURLE_OK, true)}), void();
+    if (task->cancelled()) return task->complete(CURLE_OK, true);
     CURL* easy = takeEasy();
     if (!easy || !task->configure(easy) || curl_multi_add_handle(_multi, easy) != CURLM_OK) {
-        _ended.push_back({task, task->completion(CURLE_FAILED_INIT, false)});
+        task->complete(CURLE_FAILED_INIT, false);
         if (easy) curl_easy_cleanup(easy);
         return;
     }
@@ -177,7 +504,7 @@ void Loader::end(CURL* easy, CURLcode code, bool cancelled)
     if (found == _active.end()) return;
     const std::shared_ptr<CurlTask> task = std::move(found->second);
     _active.erase(found);
-    _ended.push_back({task, task->completion(code, cancelled)});
+    task->complete(code, cancelled);
     curl_multi_remove_handle(_multi, easy);
     constexpr std::size_t kSpareHandles = 8;
     if (_spare.size() < kSpareHandles) {
@@ -188,113 +515,45 @@ void Loader::end(CURL* easy, CURLcode code, bool cancelled)
     }
 }
 
-/// Ends what has received nothing for too long.
-void Loader::endLate()
+/// Ends what has received nothing for too long, and answers how long to wait for the next such moment.
+int Loader::nextTimeout()
 {
     const auto now = std::chrono::steady_clock::now();
     std::vector<CURL*> late;
-    for (const auto& [easy, task] : _active)
-        if (task->deadline() <= now) late.push_back(easy);
+    std::chrono::milliseconds shortest(std::chrono::hours(1));
+    for (const auto& [easy, task] : _active) {
+        const auto left = task->timeLeft(now);
+        if (left.count() <= 0)
+            late.push_back(easy);
+        else
+            shortest = std::min(shortest, left);
+    }
     for (CURL* easy : late) {
         _active.at(easy)->timedOut = true;
         end(easy, CURLE_OPERATION_TIMEDOUT, false);
     }
-}
-
-void Loader::endFinished()
-{
-    int left = 0;
-    while (const CURLMsg* message = curl_multi_info_read(_multi, &left))
-        if (message->msg == CURLMSG_DONE) end(message->easy_handle, message->data.result, false);
-}
-
-void Loader::watchSocket(curl_socket_t socket, int what)
-{
-    if (what == CURL_POLL_REMOVE) {
-        epoll_ctl(_epoll.fd(), EPOLL_CTL_DEL, socket, nullptr);
-        return;
-    }
-    epoll_event event{.events = 0, .data = {.fd = socket}};
-    if (what & CURL_POLL_IN) event.events |= EPOLLIN;
-    if (what & CURL_POLL_OUT) event.events |= EPOLLOUT;
-    if (epoll_ctl(_epoll.fd(), EPOLL_CTL_MOD, socket, &event) != 0 && errno == ENOENT)
-        epoll_ctl(_epoll.fd(), EPOLL_CTL_ADD, socket, &event);
-}
-
-/// Milliseconds until curl has something to do by time; negative for never.
-long Loader::curlTimeout() const
-{
-    long milliseconds = -1;
-    curl_multi_timeout(_multi, &milliseconds);
-    return milliseconds;
-}
-
-/// The timer may be early, which costs a turn; it must not be late, nor run while nothing is under way.
-void Loader::setTimer()
-{
-    std::optional<Time> wanted;
-    if (const long left = curlTimeout(); left >= 0)
-        wanted = std::chrono::steady_clock::now() + std::chrono::milliseconds(left);
-    for (const auto& [easy, task] : _active) wanted = std::min(wanted.value_or(Time::max()), task->deadline());
-    if (wanted ? _timerSetTo && *_timerSetTo <= *wanted : !_timerSetTo) return;
-    _timerSetTo = wanted;
-    itimerspec setting{}; // zero is "off"
-    if (wanted) {
-        using namespace std::chrono;
-        const nanoseconds at = std::max(wanted->time_since_epoch(), nanoseconds(1));
-        setting.it_value = {.tv_sec = duration_cast<std::chrono::seconds>(at).count(), .tv_nsec = (at % 1s).count()};
-    }
-    timerfd_settime(_timer.fd(), TFD_TIMER_ABSTIME, &setting, nullptr);
-}
-
-/// Everything that can be done without waiting.
-void Loader::work(std::span<const epoll_event> events)
-{
-    int running = 0;
-    for (const epoll_event& event : events) {
-        if (event.data.fd == _timer.fd()) {
-            _timerSetTo.reset();
-        } else if (event.data.fd != _wake.fd()) {
-            int seen = 0;
-            if (event.events & EPOLLIN) seen |= CURL_CSELECT_IN;
-            if (event.events & EPOLLOUT) seen |= CURL_CSELECT_OUT;
-            if (event.events & (EPOLLERR | EPOLLHUP)) seen |= CURL_CSELECT_ERR;
-            curl_multi_socket_action(_multi, event.data.fd, seen, &running);
-        }
-    }
-    takeCommands();
-    while (curlTimeout() == 0) curl_multi_socket_action(_multi, CURL_SOCKET_TIMEOUT, 0, &running);
-    endFinished();
-    endLate();
-    setTimer();
+    // Without a task there is nothing to wake for: start and cancel interrupt the wait.
+    return _active.empty() ? std::numeric_limits<int>::max() : static_cast<int>(shortest.count());
 }
 
 void Loader::run()
 {
     setThreadNameForLabel("url-loader");
-    std::array<epoll_event, 32> events;
     while (true) {
-        const int count = epoll_wait(_epoll.fd(), events.data(), static_cast<int>(events.size()), -1);
         {
             std::lock_guard lock(_mutex);
             if (_stopping) break;
         }
-        std::unique_lock multi(_multiMutex);
-        work(std::span(events).first(static_cast<std::size_t>(std::max(count, 0))));
-        auto ended = std::exchange(_ended, {});
-        const bool idle = _active.empty();
-        multi.unlock();
-        for (auto& [task, completion] : ended) {
-            if (idle && ended.size() == 1)
-                task->deliverHere(std::move(completion));
-            else
-                task->deliver(std::move(completion));
-        }
+        takeCommands();
+        int running = 0;
+        curl_multi_perform(_multi, &running);
+        int left = 0;
+        while (const CURLMsg* message = curl_multi_info_read(_multi, &left))
+            if (message->msg == CURLMSG_DONE) end(message->easy_handle, message->data.result, false);
+        curl_multi_poll(_multi, nullptr, 0, nextTimeout(), nullptr);
     }
-    std::lock_guard multi(_multiMutex);
     takeCommands();
     while (!_active.empty()) end(_active.begin()->first, CURLE_OK, true);
-    for (auto& [task, completion] : std::exchange(_ended, {})) task->deliver(std::move(completion));
     for (CURL* easy : _spare) curl_easy_cleanup(easy);
     _spare.clear();
 }

@@ -235,16 +235,6 @@ void Queue::barrierAsync(Task task)
     _core->pump(handedOver);
 }
 
-void Queue::asyncHere(Task task)
-{
-    Jobs handedOver(*this);
-    std::unique_lock lock(_core->mutex);
-    const bool idle = _core->entries.empty();
-    _core->entries.push_back({.task = std::move(task), .barrier = _core->kind == Kind::Serial});
-    if (idle && _core->headMayStart()) _core->run(*this, _core->take(), lock);
-    _core->pump(handedOver);
-}
-
 void Queue::runSync(TaskRef task, bool barrier)
 {
     if (isCurrent()) abortWith("sync from a task of its own", label());

@@ -72,9 +72,6 @@ public:
 
     void async(Task task);
     void barrierAsync(Task task);
-    /// As `async`, but where the queue is idle the calling thread is the worker that runs the task: for a thread that
-    /// has nothing else to do.
-    void asyncHere(Task task);
 
     /// Runs `function` in turn and answers its result.
     template <class F> auto sync(F&& function) { return runNow(std::forward<F>(function), false); }

@@ -47,29 +47,6 @@ TEST_F(QueueTest, SyncRunsWhatWasQueuedBeforeItAndNoMore)
     EXPECT_EQ(order, (std::vector{1, 2, 3, 4}));
 }
 
-TEST_F(QueueTest, AsyncHereRunsAtOnceWhereTheQueueIsIdleAndInTurnElsewhere)
-{
-    auto queue = serial();
-    queue->asyncHere([&] {
-        EXPECT_TRUE(queue->isCurrent());
-        queue->async(note(2));
-        queue->asyncHere(note(3));
-        order.push_back(1);
-    });
-    EXPECT_EQ(order, std::vector{1});
-    executor.drain();
-    EXPECT_EQ(order, (std::vector{1, 2, 3}));
-
-    order.clear();
-    Event event;
-    queue->asyncHere([&] { queue->suspendUntil(event, 1s, note(1)); });
-    queue->asyncHere(note(2));
-    EXPECT_TRUE(order.empty()) << "it is held back";
-    event.signal();
-    executor.drain();
-    EXPECT_EQ(order, (std::vector{1, 2}));
-}
-
 TEST_F(QueueTest, KnowsWhereItIs)
 {
     auto outer = serial();
