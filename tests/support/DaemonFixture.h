@@ -46,7 +46,11 @@ public:
 
 /// The whole daemon on a device of twins: the test is the clients, the service and the clock.
 struct DaemonTest : testing::Test {
-    ~DaemonTest() override { settle(); }
+    ~DaemonTest() override
+    {
+        device.files.fault = {}; // it may refer to what the test had
+        settle();
+    }
 
     /// Lets everything under way end.
     void settle()
