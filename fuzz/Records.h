@@ -20,19 +20,19 @@ inline void checkRoundTrips(const platform::Record& record)
     }
 }
 
-/// Checks that a record of an event can be uploaded, and is not changed by that.
+/// Checks that a record of an event can be uploaded.
 inline void checkUpload(const std::shared_ptr<platform::Record>& record)
 {
     auto event = std::dynamic_pointer_cast<tavrin::TavrinFeedback>(record);
     if (auto feedback = std::dynamic_pointer_cast<tavrin::ZRFeedback>(record))
         event = std::make_shared<tavrin::TavrinFeedback>(std::move(feedback), 1, "", "");
     if (!event) return;
-    const std::string stored = platform::archive(*event);
+    check(!event->description().empty(), "no description");
     tavrin::SessionProcessingHelper helper;
-    const platform::Dictionary uploaded = event->processed(helper)->dictionary();
+    event->process(helper);
+    const platform::Dictionary uploaded = event->dictionary();
     check(uploaded.contains("type") && uploaded.contains("timestamp"), "event without its keys");
-    check(!platform::toJson(uploaded).empty() && !event->description().empty(), "no JSON");
-    check(platform::archive(*event) == stored, "the stored record was changed");
+    check(!platform::toJson(uploaded).empty(), "no JSON");
 }
 
 /// Checks that a refusal says why.

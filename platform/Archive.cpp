@@ -1,5 +1,7 @@
 #include <array>
 #include <bit>
+#include <concepts>
+#include <cstring>
 
 #include <fmt/format.h>
 #include <msgpack.hpp>
@@ -158,98 +160,74 @@ struct Token {
     }
 };
 
-/// Big-endian number of `width` bytes.
-std::uint64_t load(const char* from, std::size_t width)
+/// Big-endian number.
+template <std::unsigned_integral Number> Number load(const char* from)
 {
-    std::uint64_t number = 0;
-    for (std::size_t i = 0; i < width; ++i) number = number << 8 | static_cast<unsigned char>(from[i]);
-    return number;
+    Number number;
+    std::memcpy(&number, from, sizeof(number));
+    return std::endian::native == std::endian::little ? std::byteswap(number) : number;
 }
 
-/// Splits an archive into its tokens. A token stands for at least one byte of the archive, and once parsing has
-/// succeeded every container has as many values as it declares.
-struct Tokenizer : msgpack::null_visitor {
-    std::vector<Token> tokens;
-    const char* failure = nullptr;
-
-    bool visit_nil() { return add({}); }
-    bool visit_boolean(bool value) { return add({.type = Value::Type::Bool, .boolean = value}); }
-    bool visit_positive_integer(std::uint64_t value)
-    {
-        if (value > INT64_MAX) return add({.type = Value::Type::UInt, .unsignedInteger = value});
-        return add({.type = Value::Type::Int, .integer = static_cast<std::int64_t>(value)});
-    }
-    bool visit_negative_integer(std::int64_t value) { return add({.type = Value::Type::Int, .integer = value}); }
-    bool visit_float32(float value) { return visit_float64(double{value}); }
-    bool visit_float64(double value) { return add({.type = Value::Type::Double, .real = value}); }
-    bool visit_str(const char* text, std::uint32_t size)
-    {
-        return add({.type = Value::Type::String, .size = size, .bytes = text});
-    }
-    bool visit_bin(const char* bytes, std::uint32_t size)
-    {
-        return add({.type = Value::Type::Bytes, .size = size, .bytes = bytes});
-    }
-    bool start_array(std::uint32_t count) { return add({.type = Value::Type::Array, .size = count}); }
-    bool start_map(std::uint32_t count) { return add({.type = Value::Type::Dictionary, .size = count}); }
-
-    /// `size` counts the type byte at `body`, too.
-    bool visit_ext(const char* body, std::uint32_t size)
-    {
-        if (size == 0 || static_cast<std::int8_t>(*body) != kTimestamp) return fail("unknown extension type");
-        ++body;
-        std::int64_t seconds = 0;
-        std::uint64_t nanoseconds = 0;
-        if (size == 1 + 4) {
-            seconds = static_cast<std::int64_t>(load(body, 4));
-        } else if (size == 1 + 8) {
-            seconds = static_cast<std::int64_t>(load(body, 8) & ((std::uint64_t{1} << 34) - 1));
-            nanoseconds = load(body, 8) >> 34;
-        } else if (size == 1 + 12) {
-            nanoseconds = load(body, 4);
-            seconds = static_cast<std::int64_t>(load(body + 4, 8));
-        } else {
-            return fail("broken date");
-        }
-        const __int128 total = static_cast<__int128>(seconds) * kNanosecondsPerSecond + nanoseconds;
-        if (nanoseconds >= kNanosecondsPerSecond || total < INT64_MIN || total > INT64_MAX)
-            return fail("date out of range");
-        return add({.type = Value::Type::Date, .integer = static_cast<std::int64_t>(total)});
-    }
-
-    void parse_error(std::size_t, std::size_t) { fail("not an archive"); }
-    void insufficient_bytes(std::size_t, std::size_t) { fail("truncated"); }
-
-private:
-    bool add(Token token)
-    {
-        tokens.push_back(token);
-        return true;
-    }
-    bool fail(const char* reason)
-    {
-        failure = reason;
-        return false;
-    }
+/// What the first byte of a value says of those that follow.
+struct Head {
+    Value::Type type = Value::Type::Null;
+    std::uint8_t width = 0; ///< bytes of the number or length behind the first byte
+    bool isSigned = false;
+    bool isKnown = true;
+    std::uint32_t number = 0; ///< where the first byte has it
 };
 
+/// The format's table of first bytes: https://github.com/msgpack/msgpack/blob/master/spec.md
+constexpr Head headOf(unsigned first)
+{
+    using enum Value::Type;
+    const auto widthIn = [first](unsigned base) { return static_cast<std::uint8_t>(1u << (first - base)); };
+    if (first <= 0x7f) return {.type = Int, .number = first};
+    if (first <= 0x8f) return {.type = Dictionary, .number = first & 0x0f};
+    if (first <= 0x9f) return {.type = Array, .number = first & 0x0f};
+    if (first <= 0xbf) return {.type = String, .number = first & 0x1f};
+    if (first == 0xc0) return {};
+    if (first == 0xc1) return {.isKnown = false};
+    if (first <= 0xc3) return {.type = Bool, .number = first & 1};
+    if (first <= 0xc6) return {.type = Bytes, .width = widthIn(0xc4)};
+    if (first <= 0xc9) return {.type = Date, .width = widthIn(0xc7)};
+    if (first <= 0xcb) return {.type = Double, .width = static_cast<std::uint8_t>(first == 0xca ? 4 : 8)};
+    if (first <= 0xcf) return {.type = UInt, .width = widthIn(0xcc)};
+    if (first <= 0xd3) return {.type = Int, .width = widthIn(0xd0), .isSigned = true};
+    if (first <= 0xd8) return {.type = Date, .number = 1u << (first - 0xd4)};
+    if (first <= 0xdb) return {.type = String, .width = widthIn(0xd9)};
+    if (first <= 0xdd) return {.type = Array, .width = widthIn(0xdb)};
+    if (first <= 0xdf) return {.type = Dictionary, .width = widthIn(0xdd)};
+    return {.type = Int, .isSigned = true, .number = first};
+}
+
+constexpr auto kHeads = [] {
+    std::array<Head, 256> heads;
+    for (unsigned first = 0; first < heads.size(); ++first) heads[first] = headOf(first);
+    return heads;
+}();
+
+/// Reads an archive value by value. The library's own parsers read it whole, into objects or for a visitor, so that what
+/// records ask for one by one would have to be kept first; that took a third of the time.
 class ArchiveDecoder final : public Decoder {
 public:
     /// `archive` must outlive the decoder.
-    ArchiveDecoder(std::string_view archive, const RecordClasses& classes) : Decoder(classes)
+    ArchiveDecoder(std::string_view archive, const RecordClasses& classes)
+        : Decoder(classes), _next(archive.data()), _end(_next + archive.size()), _valuesLeft(archive.size())
+    {}
+
+    /// Says that nothing is to follow what was read.
+    void finish()
     {
-        Tokenizer tokenizer;
-        tokenizer.tokens.reserve(archive.size() / 8 + 1);
-        std::size_t end = 0;
-        if (!msgpack::parse(archive.data(), archive.size(), end, tokenizer))
-            fail(tokenizer.failure);
-        else if (end != archive.size())
-            fail("trailing bytes");
-        else
-            _tokens = std::move(tokenizer.tokens);
+        if (!failed() && (_isRead || _next != _end)) fail("trailing bytes");
     }
 
-    bool null() override { return !failed() && here().type == Value::Type::Null && (++_next, true); }
+    bool null() override
+    {
+        if (here().type != Value::Type::Null || failed()) return false;
+        _isRead = false;
+        return true;
+    }
     bool boolean() override { return take(Value::Type::Bool, "a boolean").boolean; }
     std::int64_t integer() override
     {
@@ -282,7 +260,7 @@ public:
             fail("nested too deep");
             return {};
         }
-        ++_next;
+        _isRead = false;
         switch (token.type) {
         case Value::Type::Null: return {};
         case Value::Type::Bool: return token.boolean;
@@ -313,10 +291,14 @@ public:
 
     void skip() override
     {
-        for (std::uint64_t left = failed() ? 0 : 1; left > 0; --left) left += _tokens[_next++].contents();
+        for (std::uint64_t left = 1; left > 0; --left) {
+            left += here().contents();
+            if (failed()) return;
+            _isRead = false;
+        }
     }
 
-    std::string beginRecord() override
+    std::string_view beginRecord() override
     {
         const std::uint32_t size = here().size;
         take(Value::Type::Dictionary, "a record");
@@ -324,7 +306,7 @@ public:
             fail("record without a class");
         const std::string_view className = take(Value::Type::String, "a class name").text();
         enter(size - 1);
-        return std::string(className);
+        return className;
     }
 
     bool nextKey(std::string_view& name) override
@@ -350,10 +332,12 @@ public:
     }
 
 private:
-    [[nodiscard]] const Token& here() const
+    /// The token at hand; null after a failure.
+    const Token& here()
     {
-        static constexpr Token kNothing{};
-        return failed() ? kNothing : _tokens[_next];
+        if (!_isRead && !failed()) read();
+        if (failed()) _here = {};
+        return _here;
     }
 
     /// The token at hand, which must be of that type; an empty one after a failure.
@@ -362,8 +346,90 @@ private:
         const Token token = here();
         if (token.type != type) failExpecting(expected, token.type);
         if (failed()) return {};
-        ++_next;
+        _isRead = false;
         return token;
+    }
+
+    void read()
+    {
+        _isRead = true;
+        if (_next == _end) return fail("truncated");
+        const Head& head = kHeads[static_cast<unsigned char>(*_next++)];
+        if (head.width > _end - _next) return fail("truncated");
+        const std::uint64_t number = numberBehind(head);
+        _next += head.width;
+        _here = {.type = head.type};
+        switch (head.type) {
+        case Value::Type::Null:
+            if (!head.isKnown) fail("not an archive");
+            return;
+        case Value::Type::Bool: _here.boolean = number != 0; return;
+        case Value::Type::Int: _here.integer = static_cast<std::int64_t>(number); return;
+        case Value::Type::UInt:
+            if (number <= INT64_MAX) _here.type = Value::Type::Int;
+            _here.unsignedInteger = number;
+            return;
+        case Value::Type::Double:
+            _here.real = head.width == 4 ? double{std::bit_cast<float>(static_cast<std::uint32_t>(number))}
+                                         : std::bit_cast<double>(number);
+            return;
+        case Value::Type::Date: ++_next; [[fallthrough]]; // the type of the extension
+        case Value::Type::String:
+        case Value::Type::Bytes:
+            if (_next > _end || number > static_cast<std::uint64_t>(_end - _next)) return fail("truncated");
+            _here.size = static_cast<std::uint32_t>(number);
+            _here.bytes = _next;
+            _next += number;
+            if (head.type == Value::Type::Date) readDate();
+            return;
+        case Value::Type::Array:
+        case Value::Type::Dictionary:
+            _here.size = static_cast<std::uint32_t>(number);
+            // A value takes a byte at least. All containers together can't declare more of them, whoever reserves them.
+            if (_here.contents() > _valuesLeft) return fail("truncated");
+            _valuesLeft -= _here.contents();
+            return;
+        }
+    }
+
+    /// The number behind the first byte, with its sign where it has one, or that in it.
+    [[nodiscard]] std::uint64_t numberBehind(const Head& head) const
+    {
+        const auto signedAs = [&head](auto number) -> std::uint64_t {
+            using Signed = std::make_signed_t<decltype(number)>;
+            return head.isSigned ? static_cast<std::uint64_t>(std::int64_t{static_cast<Signed>(number)}) : number;
+        };
+        switch (head.width) {
+        case 1: return signedAs(load<std::uint8_t>(_next));
+        case 2: return signedAs(load<std::uint16_t>(_next));
+        case 4: return signedAs(load<std::uint32_t>(_next));
+        case 8: return load<std::uint64_t>(_next);
+        default: return signedAs(static_cast<std::uint8_t>(head.number));
+        }
+    }
+
+    /// Makes a date of the extension at hand: a timestamp of 4, 8 or 12 bytes.
+    void readDate()
+    {
+        const char* body = _here.bytes;
+        std::int64_t seconds = 0;
+        std::uint64_t nanoseconds = 0;
+        if (static_cast<std::int8_t>(body[-1]) != kTimestamp) return fail("unknown extension type");
+        if (_here.size == 4) {
+            seconds = load<std::uint32_t>(body);
+        } else if (_here.size == 8) {
+            seconds = static_cast<std::int64_t>(load<std::uint64_t>(body) & ((std::uint64_t{1} << 34) - 1));
+            nanoseconds = load<std::uint64_t>(body) >> 34;
+        } else if (_here.size == 12) {
+            nanoseconds = load<std::uint32_t>(body);
+            seconds = static_cast<std::int64_t>(load<std::uint64_t>(body + 4));
+        } else {
+            return fail("broken date");
+        }
+        const __int128 total = static_cast<__int128>(seconds) * kNanosecondsPerSecond + nanoseconds;
+        if (nanoseconds >= kNanosecondsPerSecond || total < INT64_MIN || total > INT64_MAX)
+            return fail("date out of range");
+        _here.integer = static_cast<std::int64_t>(total);
     }
 
     /// Enters a container of `size` elements or fields.
@@ -373,8 +439,11 @@ private:
         _left.push_back(size);
     }
 
-    std::vector<Token> _tokens;
-    std::size_t _next = 0;
+    const char* _next;
+    const char* const _end;
+    std::uint64_t _valuesLeft; ///< that containers may still declare
+    Token _here;
+    bool _isRead = false; ///< `_here` is the next value, and `_next` is behind it
     std::vector<std::uint32_t> _left; ///< what is left to read of each container that was entered
 };
 
@@ -391,6 +460,7 @@ Result<std::shared_ptr<Record>> unarchive(std::string_view bytes, const RecordCl
 {
     ArchiveDecoder decoder(bytes, classes);
     auto record = decodeRecord(decoder);
+    decoder.finish();
     if (auto error = decoder.error()) return std::unexpected(std::move(*error));
     return record;
 }
@@ -407,6 +477,7 @@ Result<Value> valueFromArchive(std::string_view bytes)
     static const RecordClasses kNone;
     ArchiveDecoder decoder(bytes, kNone);
     Value value = decoder.value(2 * kMaximumDepth); // records that nest, and a value in the innermost
+    decoder.finish();
     if (auto error = decoder.error()) return std::unexpected(std::move(*error));
     return value;
 }

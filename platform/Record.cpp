@@ -27,8 +27,9 @@ std::string_view withArticle(Value::Type type)
 void decodeFields(Decoder& decoder, Record& record)
 {
     std::string_view key;
+    std::size_t next = 0;
     while (decoder.nextKey(key)) {
-        if (!record.decodeField(key, decoder)) decoder.skip();
+        if (!record.decodeField(key, decoder, next)) decoder.skip();
         if (decoder.failed()) return decoder.failedIn(key);
     }
 }
@@ -93,6 +94,18 @@ std::optional<Error> Decoder::error() const
                                                      : fmt::format("{}: {}", _failure->place, _failure->reason));
 }
 
+bool Record::decodeField(std::string_view key, Decoder& decoder, std::size_t& next)
+{
+    const auto readers = fieldReaders();
+    for (std::size_t looked = 0; looked < readers.size(); ++looked, ++next) {
+        if (next >= readers.size()) next = 0;
+        if (readers[next].name != key) continue;
+        readers[next++].read(*this, decoder);
+        return true;
+    }
+    return false;
+}
+
 void encodeRecord(Encoder& encoder, const Record& record)
 {
     encoder.beginRecord(record.className(), record.fieldCount());
@@ -102,11 +115,11 @@ void encodeRecord(Encoder& encoder, const Record& record)
 
 std::shared_ptr<Record> decodeRecord(Decoder& decoder)
 {
-    const std::string className = decoder.beginRecord();
+    const std::string_view className = decoder.beginRecord();
     if (decoder.failed()) return nullptr;
     auto record = decoder.classes().make(className);
     if (!record) {
-        decoder.fail("unknown class " + className, Decoder::kUnknownClass);
+        decoder.fail(fmt::format("unknown class {}", className), Decoder::kUnknownClass);
         return nullptr;
     }
     decodeFields(decoder, *record);
@@ -115,7 +128,7 @@ std::shared_ptr<Record> decodeRecord(Decoder& decoder)
 
 std::shared_ptr<Record> decodeRecordIfKnown(Decoder& decoder)
 {
-    const std::string className = decoder.beginRecord();
+    const std::string_view className = decoder.beginRecord();
     auto record = decoder.classes().make(className);
     if (record) {
         decodeFields(decoder, *record);
@@ -128,9 +141,9 @@ std::shared_ptr<Record> decodeRecordIfKnown(Decoder& decoder)
 
 void decodeRecordInto(Decoder& decoder, Record& record)
 {
-    const std::string className = decoder.beginRecord();
+    const std::string_view className = decoder.beginRecord();
     if (decoder.failed()) return;
-    if (className != record.className()) return decoder.fail("unexpected class " + className);
+    if (className != record.className()) return decoder.fail(fmt::format("unexpected class {}", className));
     decodeFields(decoder, record);
 }
 

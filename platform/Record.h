@@ -2,13 +2,15 @@
 
 #include <concepts>
 #include <cstdint>
-#include <map>
 #include <memory>
 #include <optional>
+#include <span>
 #include <string>
 #include <string_view>
 #include <tuple>
 #include <type_traits>
+#include <unordered_map>
+#include <utility>
 #include <vector>
 
 #include "platform/Error.h"
@@ -76,8 +78,8 @@ public:
     virtual Date date() = 0;
     virtual Value value() = 0;
     virtual void skip() = 0;
-    /// Enters a record and answers its class name. `nextKey` then moves from key to key, and leaves at the end.
-    virtual std::string beginRecord() = 0;
+    /// Enters a record and answers its class name, which lives as long as what is decoded. `nextKey` then moves from key to key, and leaves at the end.
+    virtual std::string_view beginRecord() = 0;
     /// False at the end of the record, which is then left. The view lives as long as what is decoded.
     virtual bool nextKey(std::string_view& name) = 0;
     /// Enters an array and answers a bound on its elements that is safe to reserve.
@@ -118,12 +120,21 @@ class Record {
 public:
     virtual ~Record() = default;
     [[nodiscard]] virtual std::string_view className() const = 0;
-    /// A record of the same class with the same fields; records in them are shared.
-    [[nodiscard]] virtual std::shared_ptr<Record> copy() const = 0;
     [[nodiscard]] virtual std::size_t fieldCount() const { return 0; }
     virtual void encodeFields(Encoder&) const {}
-    /// Reads the value of `key`; false if the record has no such field, and nothing is taken.
-    virtual bool decodeField(std::string_view, Decoder&) { return false; }
+    /// Reads the value of `key`; false if the record has no such field, and nothing is taken. `next` is where the field
+    /// is looked for first, by its place in the record's list; it moves on behind the field that was found. Whoever wrote
+    /// the record did so in that order.
+    virtual bool decodeField(std::string_view key, Decoder& decoder, std::size_t& next);
+
+protected:
+    /// How a field is read into a record of the class that lists it.
+    struct FieldReader {
+        std::string_view name;
+        void (*read)(Record&, Decoder&);
+    };
+    /// All fields in the order of the list, those of the base first.
+    [[nodiscard]] virtual std::span<const FieldReader> fieldReaders() const { return {}; }
 };
 
 template <class Owner, class Member> struct Field {
@@ -135,7 +146,7 @@ template <class Owner, class Member> constexpr Field<Owner, Member> field(std::s
     return {name, member};
 }
 
-/// The record classes that a reader accepts, by name.
+/// The record classes that a reader accepts, by name, in no order.
 class RecordClasses {
 public:
     using Factory = std::shared_ptr<Record> (*)();
@@ -157,15 +168,10 @@ public:
     [[nodiscard]] auto end() const { return _factories.end(); }
 
 private:
-    std::map<std::string_view, Factory> _factories;
+    std::unordered_map<std::string_view, Factory> _factories;
 };
 
 void encodeRecord(Encoder& encoder, const Record& record);
-/// A copy of a record that is a `T`, and of its class: see `Record::copy`.
-template <class T> [[nodiscard]] std::shared_ptr<T> copyOf(const T& record)
-{
-    return std::static_pointer_cast<T>(record.copy());
-}
 
 /// Reads a record of any known class; null after a failure.
 [[nodiscard]] std::shared_ptr<Record> decodeRecord(Decoder& decoder);
@@ -269,11 +275,6 @@ public:
 
     [[nodiscard]] std::string_view className() const override { return Self::kClass; }
 
-    [[nodiscard]] std::shared_ptr<Record> copy() const override
-    {
-        return std::make_shared<Self>(static_cast<const Self&>(*this));
-    }
-
     [[nodiscard]] std::size_t fieldCount() const override
     {
         return Base::fieldCount() + std::tuple_size_v<decltype(Self::fields())>;
@@ -290,15 +291,25 @@ public:
             Self::fields());
     }
 
-    bool decodeField(std::string_view key, Decoder& decoder) override
+protected:
+    [[nodiscard]] std::span<const Record::FieldReader> fieldReaders() const override
     {
-        auto& self = static_cast<Self&>(*this);
-        const bool mine = std::apply(
-            [&](const auto&... f) {
-                return ((f.name == key && (detail::decodeValue(decoder, self.*(f.member)), true)) || ...);
-            },
-            Self::fields());
-        return mine || Base::decodeField(key, decoder);
+        static const std::vector<Record::FieldReader> readers = [this] {
+            const auto inherited = Base::fieldReaders();
+            std::vector<Record::FieldReader> all(inherited.begin(), inherited.end());
+            [&all]<std::size_t... I>(std::index_sequence<I...>) {
+                (all.push_back({std::get<I>(Self::fields()).name, readField<I>}), ...);
+            }(std::make_index_sequence<std::tuple_size_v<decltype(Self::fields())>>());
+            return all;
+        }();
+        return readers;
+    }
+
+private:
+    template <std::size_t I> static void readField(Record& record, Decoder& decoder)
+    {
+        constexpr auto member = std::get<I>(Self::fields()).member;
+        detail::decodeValue(decoder, static_cast<Self&>(record).*member);
     }
 };
 

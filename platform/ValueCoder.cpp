@@ -88,7 +88,7 @@ public:
     Value value() override { return *_here; }
     void skip() override {}
 
-    std::string beginRecord() override
+    std::string_view beginRecord() override
     {
         const Dictionary* record = _here->asDictionary();
         const std::string* className = (*_here)[kClassKey].asString();

@@ -10,124 +10,91 @@ namespace {
 
 template <class T> using Shared = std::shared_ptr<T>;
 
-/// Copies records with the identifiers of their results and suggestions replaced, and tells the helper of these.
+/// Replaces the identifiers of results and suggestions, and tells the helper of these.
 class Processor {
 public:
     explicit Processor(SessionProcessingHelper& helper) : _helper(helper) {}
 
-    // A record that its event shows whole.
+    // What the event shows whole.
 
-    Shared<ZRSearchResult> shown(const Shared<ZRSearchResult>& result) { return shownLeaf(result); }
-    Shared<ZRSearchSuggestion> shown(const Shared<ZRSearchSuggestion>& suggestion) { return shownLeaf(suggestion); }
-    Shared<ZRResultSection> shown(const Shared<ZRResultSection>& section)
+    void show(ZRSearchResult& result) { showLeaf(result); }
+    void show(ZRSearchSuggestion& suggestion) { showLeaf(suggestion); }
+    void show(ZRResultSection& section) { showAll(section.results); }
+    void show(ZRResultRankingFeedback& ranking)
     {
-        return changed(section, [this](ZRResultSection& copy) { showAll(copy.results); });
+        showAll(ranking.hiddenResults);
+        showAll(ranking.duplicateResults);
+        if (ranking.result) show(*ranking.result);
     }
-    Shared<ZRResultRankingFeedback> shown(const Shared<ZRResultRankingFeedback>& ranking)
+    void show(ZRSectionRankingFeedback& ranking)
     {
-        return changed(ranking, [this](ZRResultRankingFeedback& copy) {
-            showAll(copy.hiddenResults);
-            showAll(copy.duplicateResults);
-            copy.result = shown(copy.result);
-        });
+        if (ranking.section) show(*ranking.section);
+        showAll(ranking.results);
     }
-    Shared<ZRSectionRankingFeedback> shown(const Shared<ZRSectionRankingFeedback>& ranking)
+    template <class T> void showAll(const std::vector<Shared<T>>& records)
     {
-        return changed(ranking, [this](ZRSectionRankingFeedback& copy) {
-            copy.section = shown(copy.section);
-            showAll(copy.results);
-        });
+        for (const auto& record : records)
+            if (record) show(*record);
     }
-
-    template <class T> void showAll(std::vector<Shared<T>>& records)
-    {
-        for (auto& record : records) record = shown(record);
-    }
-    template <class T> void showAll(RecordArray<T>& records)
+    template <class T> void showAll(const RecordArray<T>& records)
     {
         if (records) showAll(*records);
     }
 
-    /// A result or suggestion that its event only refers to.
-    template <class T> Shared<T> referenced(const Shared<T>& record)
+    /// A result or suggestion that the event only refers to.
+    template <class T> void refer(const Shared<T>& record)
     {
-        const Shared<T> copy = replaced(record);
-        if (copy && copy->identifier) _helper.identifierReferenced(*copy->identifier, copy);
-        return copy;
+        if (record && replaceIdentifier(*record)) _helper.identifierReferenced(*record->identifier, record);
     }
-
-    void referToAll(RecordArray<ZRSearchResult>& results)
+    void referToAll(const RecordArray<ZRSearchResult>& results)
     {
         if (!results) return;
-        for (auto& result : *results) result = referenced(result);
-    }
-
-    /// A copy of `record` that went through `change`; null for null.
-    template <class T, class Change> static Shared<T> changed(const Shared<T>& record, Change change)
-    {
-        if (!record) return nullptr;
-        const Shared<T> copy = copyOf(*record);
-        change(*copy);
-        return copy;
+        for (const auto& result : *results) refer(result);
     }
 
 private:
-    template <class T> Shared<T> shownLeaf(const Shared<T>& record)
+    template <class T> void showLeaf(T& record)
     {
-        const Shared<T> copy = replaced(record);
-        if (copy && copy->identifier) _helper.identifierExpanded(*copy->identifier);
-        return copy;
+        if (replaceIdentifier(record)) _helper.identifierExpanded(*record.identifier);
     }
 
-    template <class T> Shared<T> replaced(const Shared<T>& record)
+    /// False where there is none.
+    template <class T> bool replaceIdentifier(T& record)
     {
-        if (!record || !record->identifier) return record;
-        return changed(record,
-                       [this](T& copy) { copy.identifier = _helper.replacementForIdentifier(*copy.identifier); });
+        if (record.identifier) record.identifier = _helper.replacementForIdentifier(*record.identifier);
+        return record.identifier.has_value();
     }
 
     SessionProcessingHelper& _helper;
 };
 
-/// The same for a whole record, which is an `R`.
-template <class R, class Change> Shared<ZRFeedback> changedAs(const Shared<ZRFeedback>& record, Change change)
+template <class R> R& as(ZRFeedback& record)
 {
-    return Processor::changed(std::static_pointer_cast<R>(record), change);
+    return static_cast<R&>(record);
 }
 
 } // namespace
 
-std::shared_ptr<ZRFeedback> processedFeedback(const std::shared_ptr<ZRFeedback>& record,
-                                              SessionProcessingHelper& helper)
+void process(ZRFeedback& record, SessionProcessingHelper& helper)
 {
-    if (!record) return record;
     Processor processor(helper);
-    switch (eventType(*record)) {
+    switch (eventType(record)) {
     case EventType::VisibleResults: // whole results come with the ranking
-        return changedAs<ZRVisibleResultsFeedback>(record, [&](auto& copy) { processor.referToAll(copy.results); });
-    case EventType::RankSections:
-        return changedAs<ZRRankingFeedback>(record, [&](auto& copy) { processor.showAll(copy.sections); });
+        return processor.referToAll(as<ZRVisibleResultsFeedback>(record).results);
+    case EventType::RankSections: return processor.showAll(as<ZRRankingFeedback>(record).sections);
     case EventType::ResultsReceivedAfterTimeout:
-        return changedAs<ZRResultsReceivedAfterTimeoutFeedback>(record,
-                                                                [&](auto& copy) { processor.showAll(copy.results); });
+        return processor.showAll(as<ZRResultsReceivedAfterTimeoutFeedback>(record).results);
     case EventType::LateSectionsAppended:
-        return changedAs<ZRLateSectionsAppendedFeedback>(record, [&](auto& copy) { processor.showAll(copy.sections); });
+        return processor.showAll(as<ZRLateSectionsAppendedFeedback>(record).sections);
     case EventType::VisibleSuggestions:
-        return changedAs<ZRVisibleSuggestionsFeedback>(record,
-                                                       [&](auto& copy) { processor.showAll(copy.suggestions); });
-    case EventType::ResultEngagement:
-        return changedAs<ZRResultEngagementFeedback>(
-            record, [&](auto& copy) { copy.result = processor.referenced(copy.result); });
-    case EventType::SuggestionEngagement:
-        return changedAs<ZRSuggestionEngagementFeedback>(
-            record, [&](auto& copy) { copy.suggestion = processor.referenced(copy.suggestion); });
+        return processor.showAll(as<ZRVisibleSuggestionsFeedback>(record).suggestions);
+    case EventType::ResultEngagement: return processor.refer(as<ZRResultEngagementFeedback>(record).result);
+    case EventType::SuggestionEngagement: return processor.refer(as<ZRSuggestionEngagementFeedback>(record).suggestion);
     case EventType::Unknown: // parts of a ranking, each on its own
-        if (const auto section = std::dynamic_pointer_cast<ZRSectionRankingFeedback>(record))
-            return processor.shown(section);
-        if (const auto result = std::dynamic_pointer_cast<ZRResultRankingFeedback>(record))
-            return processor.shown(result);
-        return record;
-    default: return record;
+        if (auto* section = dynamic_cast<ZRSectionRankingFeedback*>(&record)) return processor.show(*section);
+        if (auto* result = dynamic_cast<ZRResultRankingFeedback*>(&record)) return processor.show(*result);
+        return;
+    default: return;
     }
 }
 

@@ -16,7 +16,7 @@ struct ZRSearchSuggestion;
 /// What one pass over a session's events learns while it makes them fit for upload: which small number stands for
 /// which identifier of a client, and which results and suggestions events refer to though none showed them.
 ///
-/// One helper for one pass, `TavrinFeedback::processed` for each event in time order, then the two questions about what
+/// One helper for one pass, `TavrinFeedback::process` for each event in time order, then the two questions about what
 /// is missing. Not shared between threads.
 class SessionProcessingHelper {
 public:

@@ -30,9 +30,9 @@ public:
         if (_next < _feedbacks.size()) {
             const auto feedback = std::exchange(_feedbacks[_next++], nullptr);
             _lastTimestamp = mach_duration_to_milliseconds(feedback->timestamp() - _base);
-            const auto processed = feedback->processed(_helper);
-            processed->relTimestamp = _lastTimestamp;
-            return processed->dictionary();
+            feedback->process(_helper);
+            feedback->relTimestamp = _lastTimestamp;
+            return feedback->dictionary();
         }
         if (!std::exchange(_resultsAsked, true)) {
             if (auto results = _helper.missingResults(); !results.empty())

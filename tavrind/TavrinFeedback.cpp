@@ -47,16 +47,14 @@ std::string TavrinFeedback::description() const
     return platform::toJson(std::move(event));
 }
 
-std::shared_ptr<TavrinFeedback> TavrinFeedback::processed(SessionProcessingHelper& helper) const
+void TavrinFeedback::process(SessionProcessingHelper& helper)
 {
-    auto event = std::make_shared<TavrinFeedback>(*this);
-    event->feedback = processedFeedback(feedback, helper);
-    return event;
+    if (feedback) tavrin::process(*feedback, helper);
 }
 
-bool TavrinFeedback::decodeField(std::string_view key, platform::Decoder& decoder)
+bool TavrinFeedback::decodeField(std::string_view key, platform::Decoder& decoder, std::size_t& next)
 {
-    if (key != "feedback") return RecordOf::decodeField(key, decoder);
+    if (key != "feedback") return RecordOf::decodeField(key, decoder, next);
     feedback = decoder.null() ? nullptr : std::dynamic_pointer_cast<ZRFeedback>(platform::decodeRecordIfKnown(decoder));
     return true;
 }

@@ -56,10 +56,8 @@ struct TavrinFeedback : platform::RecordOf<TavrinFeedback> {
     /// The event as one line of JSON for logs and listeners, its "timestamp" the record's own, in milliseconds of the
     /// host's clock.
     [[nodiscard]] std::string description() const;
-    /// The event as it may leave the device: identifiers of results and suggestions are replaced, and `helper` knows of
-    /// those that it shows or refers to. This event and its record stay as they are; what holds no identifier is shared
-    /// with them.
-    [[nodiscard]] std::shared_ptr<TavrinFeedback> processed(SessionProcessingHelper& helper) const;
+    /// Makes the event fit to leave the device, once: see `tavrin::process`.
+    void process(SessionProcessingHelper& helper);
 
     static constexpr auto fields()
     {
@@ -70,7 +68,7 @@ struct TavrinFeedback : platform::RecordOf<TavrinFeedback> {
             platform::field("user_agent", &Self::userAgent),   platform::field("_clientQueryId", &Self::clientQueryId)};
     }
     /// As for any record, but a record in "feedback" that is none of an event reads as null.
-    bool decodeField(std::string_view key, platform::Decoder& decoder) override;
+    bool decodeField(std::string_view key, platform::Decoder& decoder, std::size_t& next) override;
 
 private:
     /// All of `dictionary()` but the timestamp, which comes last.

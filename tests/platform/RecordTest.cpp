@@ -155,16 +155,6 @@ TEST(Record, AnArrayThatMayBeMissingIsToldFromAnEmptyOne)
     }
 }
 
-TEST(Record, CopiesKeepTheClassAndShareInnerRecords)
-{
-    const auto record = sample();
-    const std::shared_ptr<Whole> copy = copyOf<Whole>(*record);
-    EXPECT_EQ(archive(*copy), archive(*record));
-    EXPECT_EQ(copy->parts[0], record->parts[0]);
-    copy->parts.clear();
-    EXPECT_EQ(record->parts.size(), 2u);
-}
-
 TEST(Record, UnknownKeysAreSkippedAndMissingOnesReadAsZero)
 {
     const Value value =
@@ -221,9 +211,9 @@ TEST(Record, BrokenArchivesAreRefusedWithAReason)
         {"\xdf\xff\xff\xff\xff\xa5"
          "class",
          "truncated"},
-        {partWith("\xa5inner\xdb\xff\xff\xff\xff"), "truncated"},
-        {partWith("\xa5inner\xc6\xff\xff\xff\xff"), "truncated"},
-        {partWith("\xa1x\xc9\xff\xff\xff\xff\xff"), "truncated"},
+        {partWith("\xa5inner\xdb\xff\xff\xff\xff"), "inner: truncated"},
+        {partWith("\xa5inner\xc6\xff\xff\xff\xff"), "inner: truncated"},
+        {partWith("\xa1x\xc9\xff\xff\xff\xff\xff"), "x: truncated"},
         {"\xc1", "not an archive"},
         {"\x90", "expected a record, found an array"},
         {"\x80", "record without a class"},
@@ -238,11 +228,11 @@ TEST(Record, BrokenArchivesAreRefusedWithAReason)
         {partWith("\x01\x02"), "expected a key, found an integer"},
         {partWith("\xa5score\xa1x"), "score: expected a double, found a string"},
         {partWith("\xa5inner\x90"), "inner: expected a record, found an array"},
-        {partWith("\xa1x\xd4\x05x"), "unknown extension type"},
-        {partWith("\xa1x\xd5\xffxx"), "broken date"},
-        {partWith("\xa1x\xd7\xff\xff\xff\xff\xff\0\0\0\0"s), "date out of range"},
-        {partWith("\xa1x\xc7\x0c\xff\0\0\0\0\x7f\xff\xff\xff\xff\xff\xff\xff"s), "date out of range"},
-        {partWith("\xa1x\xc7\x0c\xff\0\0\0\0\x80\0\0\0\0\0\0\0"s), "date out of range"},
+        {partWith("\xa1x\xd4\x05x"), "x: unknown extension type"},
+        {partWith("\xa1x\xd5\xffxx"), "x: broken date"},
+        {partWith("\xa1x\xd7\xff\xff\xff\xff\xff\0\0\0\0"s), "x: date out of range"},
+        {partWith("\xa1x\xc7\x0c\xff\0\0\0\0\x7f\xff\xff\xff\xff\xff\xff\xff"s), "x: date out of range"},
+        {partWith("\xa1x\xc7\x0c\xff\0\0\0\0\x80\0\0\0\0\0\0\0"s), "x: date out of range"},
     };
     for (const auto& [bytes, reason] : cases) EXPECT_EQ(reasonOf(unarchive(bytes, classes())), reason);
 }
@@ -302,7 +292,7 @@ TEST(Record, DamagedArchivesNeverCrash)
 {
     const std::string bytes = archive(*sample());
     for (std::size_t length = 0; length < bytes.size(); ++length) {
-        EXPECT_EQ(reasonOf(unarchive(std::string_view(bytes).substr(0, length), classes())), "truncated");
+        EXPECT_TRUE(reasonOf(unarchive(std::string_view(bytes).substr(0, length), classes())).ends_with("truncated"));
         EXPECT_EQ(reasonOf(valueFromArchive(std::string_view(bytes).substr(0, length))), "truncated");
     }
     for (std::size_t bit = 0; bit < bytes.size() * 8; ++bit) {

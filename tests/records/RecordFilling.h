@@ -89,7 +89,7 @@ public:
         return any;
     }
     void skip() override {}
-    std::string beginRecord() override
+    std::string_view beginRecord() override
     {
         const auto record = classes().make(_nested);
         put(record ? platform::toValue(*record) : Value());
@@ -127,7 +127,7 @@ inline std::map<std::string, Value> fill(platform::Record& record, const platfor
     for (const std::string& name : FieldNames::of(record)) {
         for (const auto& [nested, factory] : classes) {
             Filler filler(classes, std::string(nested), number);
-            if (!record.decodeField(name, filler) || filler.failed()) continue;
+            if (std::size_t next = 0; !record.decodeField(name, filler, next) || filler.failed()) continue;
             if (!(platform::toValue(record)[name] == filler.given())) continue; // read as null
             given[name] = filler.given();
             break;
@@ -141,7 +141,6 @@ class LooseRecord final : public platform::Record {
 public:
     explicit LooseRecord(const Value& dictionary) : _dictionary(*dictionary.asDictionary()) {}
     [[nodiscard]] std::string_view className() const override { return *_dictionary.find("class")->asString(); }
-    [[nodiscard]] std::shared_ptr<Record> copy() const override { return std::make_shared<LooseRecord>(*this); }
     [[nodiscard]] std::size_t fieldCount() const override { return _dictionary.size() - 1; }
     void encodeFields(platform::Encoder& encoder) const override
     {

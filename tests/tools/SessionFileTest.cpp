@@ -64,7 +64,7 @@ TEST(SessionFile, DamageHasItsPlaceAndKeepsWhatIsBefore)
         {whole + kEvent.substr(0, kEvent.size() - 1), whole.size(), 1, "cut off"},
         {whole + framed("\xc1"), whole.size(), 1, "not an archive"},
         {whole + framed("\xc0\xc0"), whole.size(), 1, "trailing bytes"},
-        {whole + framed("\xdf\xff\xff\xff\xff"), whole.size(), 1, "not an archive"},
+        {whole + framed("\xdf\xff\xff\xff\xff"), whole.size(), 1, "truncated"},
         {whole + framed(std::string(100'000, '\x91') + "\xc0"), whole.size(), 1, "too deep"},
     };
     for (const auto& [bytes, offset, events, reason] : cases) {

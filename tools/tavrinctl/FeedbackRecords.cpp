@@ -1,6 +1,7 @@
 #include "tools/tavrinctl/FeedbackRecords.h"
 
 #include <algorithm>
+#include <map>
 
 #include <fmt/format.h>
 
@@ -149,15 +150,17 @@ std::expected<std::vector<ReportedEvent>, std::vector<std::string>> eventsIn(con
 
 Dictionary reportableRecords()
 {
-    Dictionary records;
+    std::map<std::string_view, Value> records;
     for (const auto& [name, make] : coreRecordClasses()) {
         const auto record = make();
         if (!dynamic_cast<const ZRFeedback*>(record.get())) continue;
         FieldNames fields;
         platform::encodeRecord(fields, *record);
-        records.set(std::string(name), std::move(fields.names));
+        records.emplace(name, std::move(fields.names));
     }
-    return records;
+    Dictionary inOrder;
+    for (auto& [name, fields] : records) inOrder.set(std::string(name), std::move(fields));
+    return inOrder;
 }
 
 } // namespace tavrin::ctl
