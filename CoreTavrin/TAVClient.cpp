@@ -85,9 +85,9 @@ Result<std::unique_ptr<ipc::Client>> TAVConnection::open(const std::string& addr
     return ipc::Client::connect(address, kConnectTimeout);
 }
 
-bool TAVConnection::wait(const std::function<bool()>& done, platform::Duration timeout)
+bool TAVConnection::wait(const std::function<bool()>& done, platform::Duration timeout, int descriptor)
 {
-    return _client->wait(done, timeout);
+    return _client->wait(done, timeout, descriptor);
 }
 
 bool TAVConnection::connected() const

@@ -52,8 +52,10 @@ public:
 
     /// How long the calls that wait do so; 30 s. A daemon that has just been started needs some of it.
     void setTimeout(platform::Duration timeout) { _timeout = timeout; }
-    /// Runs callbacks until `done()`, and answers that; false when `timeout` passed or the connection ended before.
-    bool wait(const std::function<bool()>& done, platform::Duration timeout);
+    /// Runs callbacks until `done()`, and answers that; false when `timeout` passed or the connection ended before. A
+    /// program that waits for something else too, such as keys, gives its descriptor: `done` is asked again, and reads it,
+    /// whenever it can be read.
+    bool wait(const std::function<bool()>& done, platform::Duration timeout, int descriptor = -1);
     /// False once the daemon has closed the connection, as it does after an invalid configuration.
     [[nodiscard]] bool connected() const;
 

@@ -1,6 +1,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <poll.h>
 #include <time.h>
 
 #include <fmt/format.h>
@@ -26,6 +27,20 @@ std::uint64_t microseconds(Duration duration)
 {
     const auto count = std::chrono::duration_cast<std::chrono::microseconds>(duration).count();
     return count > 0 ? static_cast<std::uint64_t>(count) : 0;
+}
+
+/// Waits until there is something for the bus to do, `descriptor` can be read (-1: there is none), a signal was handled or
+/// the deadline has passed; false when there is no waiting.
+bool waitForInput(sd_bus* bus, int descriptor, std::uint64_t now, std::uint64_t deadline)
+{
+    const int events = sd_bus_get_events(bus);
+    std::uint64_t callTimesOut = UINT64_MAX;
+    if (events < 0 || sd_bus_get_timeout(bus, &callTimesOut) < 0) return false;
+    const std::uint64_t until = std::min(callTimesOut, deadline);
+    const std::uint64_t left = until > now ? until - now : 0;
+    const timespec timeout{static_cast<time_t>(left / 1'000'000), static_cast<long>(left % 1'000'000 * 1'000)};
+    pollfd watched[] = {{sd_bus_get_fd(bus), static_cast<short>(events), 0}, {descriptor, POLLIN, 0}};
+    return ppoll(watched, std::size(watched), &timeout, nullptr) >= 0 || errno == EINTR;
 }
 
 /// Decodes a received message that should have `signature`.
@@ -159,7 +174,7 @@ void Client::onSignal(std::function<void(std::string_view, std::string_view, Mes
     _impl->signalHandler = std::move(handler);
 }
 
-bool Client::wait(const std::function<bool()>& done, Duration timeout)
+bool Client::wait(const std::function<bool()>& done, Duration timeout, int descriptor)
 {
     const std::uint64_t deadline = monotonicMicroseconds() + microseconds(timeout);
     sd_bus* bus = _impl->bus.get();
@@ -173,8 +188,7 @@ bool Client::wait(const std::function<bool()>& done, Duration timeout)
         if (result > 0 || !_impl->failures.empty()) continue;
         const std::uint64_t now = monotonicMicroseconds();
         if (now >= deadline) return false;
-        result = sd_bus_wait(bus, deadline - now);
-        if (result < 0 && result != -EINTR) return false;
+        if (!waitForInput(bus, descriptor, now, deadline)) return false;
     }
 }
 

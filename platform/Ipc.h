@@ -171,8 +171,9 @@ public:
               std::optional<Duration> timeout = std::nullopt);
     /// Handles signals inside `wait`: interface, member, arguments.
     void onSignal(std::function<void(std::string_view, std::string_view, Message)> handler);
-    /// Reads and dispatches until `done()` is true, the connection ends (false) or `timeout` passes (false).
-    bool wait(const std::function<bool()>& done, Duration timeout);
+    /// Reads and dispatches until `done()` is true, the connection ends (false) or `timeout` passes (false). `done` is
+    /// asked again after whatever arrives, and whenever `descriptor` can be read: it reads it then.
+    bool wait(const std::function<bool()>& done, Duration timeout, int descriptor = -1);
     [[nodiscard]] bool connected() const;
 
 private:

@@ -29,7 +29,7 @@ Exchange run(const Options& options, const RequestOptions& requestOptions, TAVRe
 {
     request.verboseReply = requestOptions.verbose;
     request.queryItems = queryItems(requestOptions.items);
-    RequestRunner runner(options);
+    RequestRunner runner(options, requestOptions.verbose);
     return requestOptions.endpoint ? runner.runThroughEndpoint(request, requestOptions.what)
                                    : runner.run(request, requestOptions.what);
 }

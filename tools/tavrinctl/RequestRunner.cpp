@@ -18,7 +18,8 @@ double millisecondsSince(Clock::time_point begin)
 
 } // namespace
 
-RequestRunner::RequestRunner(const Options& options) : _options(options), _session(openSession(options))
+RequestRunner::RequestRunner(const Options& options, bool showHttp)
+    : _options(options), _showHttp(showHttp), _session(openSession(options))
 {
     _bag = valueOf(_session.client->bag());
 }
@@ -28,6 +29,7 @@ std::shared_ptr<Exchange> RequestRunner::send(TAVRequest& request, std::string q
     for (const auto& earlier : _outstanding) earlier->overtaken = true;
     auto exchange = std::make_shared<Exchange>();
     exchange->query = std::move(query);
+    exchange->showHttp = _showHttp;
     exchange->queryId = request.queryId = ++_lastQueryId;
     if (dynamic_cast<const TAVSearchRequest*>(&request)) exchange->skipReason = skipReason(_bag, exchange->query);
     _outstanding.push_back(exchange);
@@ -43,6 +45,13 @@ std::shared_ptr<Exchange> RequestRunner::send(TAVRequest& request, std::string q
                               if (answered) answered(*exchange);
                           });
     return exchange;
+}
+
+bool RequestRunner::takeAnswers(const std::function<bool()>& done, int descriptor)
+{
+    while (!_session.client->wait(done, std::chrono::hours(24), descriptor))
+        if (!_session.client->connected()) return false;
+    return true;
 }
 
 void RequestRunner::pause(std::chrono::duration<double, std::milli> duration)
@@ -73,6 +82,7 @@ Exchange RequestRunner::runThroughEndpoint(TAVRequest& request, std::string quer
     endpoint->setTimeout(platform::durationFromSeconds(_options.timeout));
     Exchange exchange;
     exchange.query = std::move(query);
+    exchange.showHttp = _showHttp;
     exchange.queryId = request.queryId = ++_lastQueryId;
     const auto begin = Clock::now();
     auto answer = endpoint->request(request, _session.configuration);

@@ -19,11 +19,15 @@ namespace tavrin::ctl {
 /// Sends requests over one configured connection, numbers and times them. One thread.
 class RequestRunner {
 public:
-    explicit RequestRunner(const Options& options);
+    /// `showHttp`: the HTTP requests and responses of verbose replies are to be shown.
+    explicit RequestRunner(const Options& options, bool showHttp = false);
 
     using Shown = std::function<void(const Exchange&)>;
     /// Sends a request; `answered` is called when its answer is there, inside one of the waiting calls below.
     std::shared_ptr<Exchange> send(TAVRequest& request, std::string query, Shown answered = {});
+    /// Takes answers until `done()`, which is asked again after each of them, and whenever `descriptor` can be read. False:
+    /// the daemon closed the connection.
+    [[nodiscard]] bool takeAnswers(const std::function<bool()>& done, int descriptor);
     /// Takes answers for a while.
     void pause(std::chrono::duration<double, std::milli> duration);
     /// Takes answers until every request has one; those without one in time say so.
@@ -35,6 +39,7 @@ public:
 
 private:
     const Options& _options;
+    const bool _showHttp;
     Session _session;
     TAVBagAnswer _bag;
     std::vector<std::shared_ptr<Exchange>> _outstanding;

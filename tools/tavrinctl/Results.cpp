@@ -10,6 +10,7 @@
 #include "CoreTavrin/TAVError.h"
 #include "CoreTavrin/TAVReply.h"
 #include "platform/Text.h"
+#include "tools/tavrinctl/Characters.h"
 #include "tools/tavrinctl/Tool.h"
 
 namespace tavrin::ctl {
@@ -93,6 +94,28 @@ Outcome Exchange::outcome() const
     return overtaken && skipReason.empty() ? Outcome::Overtaken : Outcome::Skipped;
 }
 
+std::string_view mark(const Exchange& exchange)
+{
+    const Outcome outcome = exchange.outcome();
+    if (outcome != Outcome::Answered || !exchange.answer->reply->httpRequest) return outcomeName(outcome);
+    // From memory there is the request that once fetched the answer, and no response.
+    return exchange.answer->reply->httpResponse ? "network" : "cache";
+}
+
+std::string explanation(const Exchange& exchange)
+{
+    switch (exchange.outcome()) {
+    case Outcome::Answered: {
+        const Value raw = rawResponse(exchange);
+        return fmt::format("{}, {}", counted(resultsIn(raw).size(), "result"), counted(raw.count(), "set"));
+    }
+    case Outcome::Skipped: return exchange.skipReason;
+    case Outcome::Overtaken: return "came after a later key, delivered empty";
+    case Outcome::Failed: break;
+    }
+    return exchange.answer ? explain(*exchange.answer->error) : exchange.problem;
+}
+
 std::string skipReason(const TAVBagAnswer& answer, std::string_view query)
 {
     if (!answer.bag) return {};
@@ -153,9 +176,11 @@ Value describe(const Exchange& exchange)
                                                {"url", result.url},
                                                {"description", result.description}}));
     for (std::string& suggestion : suggestionsIn(raw)) suggestions.emplace_back(std::move(suggestion));
+    if (mark(exchange) != outcomeName(Outcome::Answered)) description.set("source", mark(exchange));
     description.set("results", std::move(results));
     description.set("suggestions", std::move(suggestions));
     description.set("response", raw);
+    if (!exchange.showHttp) return description;
     const TAVReply& reply = *exchange.answer->reply;
     if (reply.httpRequest) description.set("http_request", platform::toValue(*reply.httpRequest));
     if (reply.httpResponse) description.set("http_response", platform::toValue(*reply.httpResponse));
@@ -164,26 +189,16 @@ Value describe(const Exchange& exchange)
 
 std::string summary(const Exchange& exchange)
 {
-    std::string what = std::string(outcomeName(exchange.outcome()));
-    switch (exchange.outcome()) {
-    case Outcome::Answered: {
-        const Value raw = rawResponse(exchange);
-        what = fmt::format("{}, {}", counted(resultsIn(raw).size(), "result"), counted(raw.count(), "set"));
-        break;
-    }
-    case Outcome::Skipped:
-        if (!exchange.skipReason.empty()) what += ": " + exchange.skipReason;
-        break;
-    case Outcome::Overtaken: what += ": came after a later key, delivered empty"; break;
-    case Outcome::Failed: what += ": " + (exchange.answer ? explain(*exchange.answer->error) : exchange.problem); break;
-    }
-    return fmt::format("{:<16} {:>7.1f} ms  {}", "\"" + printable(exchange.query) + "\"", exchange.latency, what);
+    std::string line = fmt::format("{} {:>7.1f} ms  {}", padded("\"" + printable(exchange.query) + "\"", 16),
+                                   exchange.latency, mark(exchange));
+    if (const std::string why = explanation(exchange); !why.empty()) line += ": " + why;
+    return line;
 }
 
 void printAnswer(const Exchange& exchange, std::size_t limit)
 {
     if (exchange.outcome() != Outcome::Answered) return;
-    printHttp(*exchange.answer->reply);
+    if (exchange.showHttp) printHttp(*exchange.answer->reply);
     const Value raw = rawResponse(exchange);
     std::string section;
     const std::vector<ListedResult> results = resultsIn(raw);

@@ -27,8 +27,17 @@ struct Exchange {
     std::optional<TAVAnswer> answer; ///< none: no answer in time, or the connection ended
     std::string problem;             ///< what happened instead of an answer
 
+    bool showHttp = false;           ///< the HTTP request and response are to be shown
+
     [[nodiscard]] Outcome outcome() const;
+    [[nodiscard]] bool waiting() const { return !answer && problem.empty(); }
 };
+
+/// "network" or "cache", where the answer came from; "answered" where a reply that isn't verbose doesn't tell. Else its
+/// outcome's name.
+[[nodiscard]] std::string_view mark(const Exchange& exchange);
+/// How much came, or why nothing did; may be empty.
+[[nodiscard]] std::string explanation(const Exchange& exchange);
 
 /// Why the daemon doesn't ask the service for `query` under this bag; empty if it does.
 [[nodiscard]] std::string skipReason(const TAVBagAnswer& bag, std::string_view query);
@@ -51,8 +60,8 @@ struct ListedResult {
 [[nodiscard]] platform::Value describe(const Exchange& exchange);
 /// One line: what was asked, what became of it, how long it took.
 [[nodiscard]] std::string summary(const Exchange& exchange);
-/// Results by section, suggestions, and the HTTP request and response of a verbose reply. At most `limit` results; 0 is
-/// all.
+/// Results by section, suggestions, and the HTTP request and response where they are to be shown. At most `limit` results;
+/// 0 is all.
 void printAnswer(const Exchange& exchange, std::size_t limit);
 
 } // namespace tavrin::ctl

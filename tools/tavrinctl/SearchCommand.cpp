@@ -1,4 +1,4 @@
-// tavrinctl search: one query, or one for every key as a user would type it.
+// tavrinctl search: one query, one for every key as a user would type it, or one for every key that is typed.
 
 #include <chrono>
 
@@ -7,6 +7,7 @@
 
 #include "CoreTavrin/TAVRequest.h"
 #include "tools/tavrinctl/Commands.h"
+#include "tools/tavrinctl/InteractiveSearch.h"
 #include "tools/tavrinctl/RequestRunner.h"
 
 namespace tavrin::ctl {
@@ -18,6 +19,7 @@ namespace {
 struct SearchOptions {
     std::string query;
     bool typed = false;
+    bool interactive = false;
     bool verbose = false;
     double interval = 80; // milliseconds
     std::vector<std::string> items;
@@ -36,14 +38,15 @@ std::vector<std::string> prefixes(const std::string& query)
 
 void search(const Options& options, const SearchOptions& searchOptions)
 {
-    RequestRunner runner(options);
     const auto request = [&](const std::string& query) {
         auto search = TAVSearchRequest::searchRequestWithString(query, StartSearchTrigger::NewCharacter);
-        search->verboseReply = searchOptions.verbose;
+        search->verboseReply = true; // it tells the cache's answers from the service's
         search->queryItems = queryItems(searchOptions.items);
         return search;
     };
+    if (searchOptions.interactive) return searchInteractively(options, searchOptions.query, request);
 
+    RequestRunner runner(options, searchOptions.verbose);
     if (!searchOptions.typed) return finish(options, runner.run(*request(searchOptions.query), searchOptions.query));
 
     // Lines come as answers do; a later key may overtake an earlier one's.
@@ -73,14 +76,20 @@ void addSearchCommand(CLI::App& app, Command& chosen)
 {
     auto options = std::make_shared<SearchOptions>();
     CLI::App* command = app.add_subcommand("search", "Search, once or as a user types");
-    command->add_option("query", options->query, "What to search for")->required();
-    command->add_flag("--typed", options->typed, "Send a request for each key, without waiting for the answers");
+    command->add_option("query", options->query, "What to search for; with --interactive, what to begin with");
+    CLI::Option* interactive =
+        command->add_flag("-i,--interactive", options->interactive, "Type in the terminal, and see what every key brings");
+    command->add_flag("--typed", options->typed, "Send a request for each key, without waiting for the answers")
+        ->excludes(interactive);
     command->add_option("--interval", options->interval, "Milliseconds between keys")
         ->check(CLI::Range(0.0, 60000.0))
         ->capture_default_str();
     command->add_flag("-v,--verbose", options->verbose, "Show the HTTP request and response");
     command->add_option("--item", options->items, "NAME=VALUE to add to the request's query; may be repeated");
-    command->callback([options, &chosen] { chosen = [options](const Options& common) { search(common, *options); }; });
+    command->callback([options, &chosen] {
+        if (options->query.empty() && !options->interactive) throw CLI::RequiredError("query, or --interactive,");
+        chosen = [options](const Options& common) { search(common, *options); };
+    });
 }
 
 } // namespace tavrin::ctl

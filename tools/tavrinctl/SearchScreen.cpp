@@ -1,0 +1,156 @@
+#include "tools/tavrinctl/SearchScreen.h"
+
+#include <algorithm>
+#include <span>
+
+#include <fmt/format.h>
+
+#include "tools/tavrinctl/Characters.h"
+#include "tools/tavrinctl/Results.h"
+#include "tools/tavrinctl/Tool.h"
+
+namespace tavrin::ctl {
+
+namespace {
+
+using Style = ScreenLine::Style;
+
+constexpr std::string_view kPrompt = "Search: ";
+constexpr std::string_view kHelp = "Ctrl-U clears, arrows move and scroll, Ctrl-C ends";
+constexpr int kMostKeys = 6;
+
+/// Rows for each part, from top to bottom.
+struct Rows {
+    int gap = 0; ///< under the line that is typed
+    int answer = 0;
+    int keys = 0;
+    bool help = false;
+};
+
+Rows share(int rows, std::size_t keys)
+{
+    Rows result;
+    int left = rows - 1; // the line that is typed
+    result.help = left >= 6;
+    if (result.help) --left;
+    const int most = std::min(kMostKeys, left / 3);
+    result.keys = std::min(most, static_cast<int>(std::min<std::size_t>(keys, kMostKeys)));
+    if (result.keys > 0) left -= result.keys + 1; // a blank line above them
+    result.gap = left > 3 ? 1 : 0;
+    result.answer = left - result.gap;
+    return result;
+}
+
+/// The part of the text around the cursor that fits, which the cursor is in.
+struct Part {
+    std::string text;
+    int cursorColumn;
+};
+Part aroundCursor(std::string_view text, std::size_t cursor, int columns)
+{
+    const int wanted = columnsOf(text.substr(0, cursor));
+    int skipped = 0;
+    std::size_t begin = 0;
+    for (const Character& character : charactersOf(text)) {
+        if (wanted - skipped < columns) break; // the cursor has a column of its own
+        skipped += character.columns;
+        begin += character.bytes.size();
+    }
+    std::string part;
+    int left = columns;
+    for (const Character& character : charactersOf(text.substr(begin))) {
+        left -= character.columns;
+        if (left < 0) break;
+        part += character.bytes;
+    }
+    return {part, std::max(wanted - skipped, 0)};
+}
+
+} // namespace
+
+std::size_t answerRows(std::size_t keys, ScreenSize size)
+{
+    return static_cast<std::size_t>(share(size.rows, keys).answer);
+}
+
+ScreenFrame layOut(const SearchView& view, ScreenSize size)
+{
+    const int columns = std::max(size.columns, 1);
+    const Rows rows = share(std::max(size.rows, 1), view.keys.size());
+    ScreenFrame frame;
+
+    const int promptColumns = columns > 2 * static_cast<int>(kPrompt.size()) ? static_cast<int>(kPrompt.size()) : 0;
+    const Part typed = aroundCursor(view.text, view.cursor, columns - promptColumns);
+    frame.lines.push_back(
+        {std::string(kPrompt.substr(0, static_cast<std::size_t>(promptColumns))) + typed.text, Style::Bold});
+    frame.cursorColumn = promptColumns + typed.cursorColumn;
+
+    const auto add = [&](std::string_view text, Style style = Style::Plain) {
+        frame.lines.push_back({clipped(text, columns), style});
+    };
+    const auto fillTo = [&](int row) {
+        while (static_cast<int>(frame.lines.size()) < row) frame.lines.emplace_back();
+    };
+    fillTo(1 + rows.gap);
+    if (rows.answer > 0) {
+        const auto room = static_cast<std::size_t>(rows.answer);
+        const std::size_t begin = std::min(view.scrolled, view.answer.size());
+        const std::size_t end = std::min(begin + room, view.answer.size());
+        const bool more = end < view.answer.size();
+        for (std::size_t i = begin; i < end - (more ? 1 : 0); ++i) add(view.answer[i].text, view.answer[i].style);
+        if (more) add(fmt::format("  … {} more lines", view.answer.size() - end + 1), Style::Dim);
+    }
+    const int below = rows.keys + (rows.keys > 0 ? 1 : 0) + (rows.help ? 1 : 0);
+    fillTo(std::max(size.rows, 1) - below);
+    if (rows.keys > 0) {
+        add("");
+        for (const std::string& key : std::span(view.keys).last(static_cast<std::size_t>(rows.keys))) add(key);
+    }
+    if (rows.help) add(kHelp, Style::Dim);
+    return frame;
+}
+
+std::string drawn(const ScreenFrame& frame, bool colours)
+{
+    std::string bytes = "\033[?25l"; // no cursor while it moves about
+    for (std::size_t row = 0; row < frame.lines.size(); ++row) {
+        const ScreenLine& line = frame.lines[row];
+        const char* style = line.style == Style::Bold ? "\033[1m" : line.style == Style::Dim ? "\033[2m" : "";
+        bytes += fmt::format("\033[{};1H", row + 1);
+        bytes += colours && *style ? style + line.text + "\033[0m" : line.text;
+        bytes += "\033[K";
+    }
+    return bytes + fmt::format("\033[J\033[1;{}H\033[?25h", frame.cursorColumn + 1);
+}
+
+std::vector<ScreenLine> answerLines(const Exchange& exchange)
+{
+    if (exchange.outcome() != Outcome::Answered) return {{explanation(exchange), Style::Dim}};
+    std::vector<ScreenLine> lines;
+    const platform::Value raw = rawResponse(exchange);
+    std::string section;
+    for (const ListedResult& result : resultsIn(raw)) {
+        if (result.section != section) lines.push_back({printable(section = result.section), Style::Bold});
+        std::string text = "  " + printable(result.title);
+        if (!result.description.empty()) text += " – " + printable(result.description);
+        lines.push_back({std::move(text)});
+    }
+    std::string suggestions;
+    for (const std::string& suggestion : suggestionsIn(raw))
+        suggestions += (suggestions.empty() ? "" : " · ") + printable(suggestion);
+    if (!suggestions.empty()) {
+        lines.push_back({"Suggestions", Style::Bold});
+        lines.push_back({"  " + suggestions});
+    }
+    if (lines.empty()) lines.push_back({"no results", Style::Dim});
+    return lines;
+}
+
+std::string keyLine(const Exchange& exchange)
+{
+    const std::string query = padded("\"" + printable(exchange.query) + "\"", 24);
+    if (exchange.waiting()) return query + "  …";
+    return fmt::format("{}  {:<9} {:>8.1f} ms  {}", query, mark(exchange), exchange.latency, explanation(exchange));
+}
+
+} // namespace tavrin::ctl
