@@ -1,0 +1,72 @@
+#pragma once
+
+#include <cstdint>
+#include <map>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "CoreTavrin/TAVClient.h"
+#include "platform/Value.h"
+
+namespace tavrin::replay {
+
+enum class Kind {
+    Cache,     ///< answered from memory
+    Network,   ///< answered by the service
+    Empty,     ///< neither reply nor error: too short, switched off, or overtaken
+    Failed,
+};
+
+/// One key's search.
+struct Search {
+    std::int64_t queryId = 0;
+    std::string text;
+    bool overtaken = false; ///< a later key was sent before the answer came
+    bool tooShort = false;  ///< for the bag, or the bag has search switched off
+    double sent = 0;        ///< seconds on the monotonic clock
+    double answered = 0;
+};
+
+[[nodiscard]] Kind kindOf(const platform::Result<TAVAnswer>& answer);
+
+/// Keeps account of the answers to one connection's searches, which are verbose, and finds those that should never have been
+/// delivered. Times come from the caller.
+class Report {
+public:
+    /// Answers are to be added as they come.
+    void add(const Search& search, const platform::Result<TAVAnswer>& answer);
+    /// No answer came for this one.
+    void addUnanswered(const Search& search);
+
+    [[nodiscard]] std::uint64_t keys() const { return _keys; }
+    [[nodiscard]] std::uint64_t hits() const { return static_cast<std::uint64_t>(_cache.size()); }
+    /// Searches that went to the service; those that were overtaken on their way included.
+    [[nodiscard]] std::uint64_t requests() const { return _network.size() + _overtaken + _failed.size(); }
+    /// What was wrong with each answer that was stale, or that failed.
+    [[nodiscard]] const std::vector<std::string>& stale() const { return _stale; }
+    [[nodiscard]] const std::vector<std::string>& failed() const { return _failed; }
+
+    [[nodiscard]] platform::Value json() const;
+    [[nodiscard]] std::string text() const;
+
+private:
+    void checkOrder(const Search& search);
+    void checkCached(const Search& search, const TAVAnswer& answer, const platform::Value& sets);
+    [[nodiscard]] double savedPercent() const;
+
+    std::uint64_t _keys = 0;
+    std::uint64_t _skipped = 0;
+    std::uint64_t _overtaken = 0;
+    std::vector<double> _cache;   // latencies in seconds
+    std::vector<double> _network;
+    std::vector<std::string> _stale;
+    std::vector<std::string> _failed;
+    std::int64_t _newestAnswered = 0;
+    std::map<std::string, double> _fetched; // when the service's latest answer for a text had come, overtaken or not
+};
+
+/// The value that so many percent of all are not above; 0 for none.
+[[nodiscard]] double percentile(std::vector<double> values, double percent);
+
+} // namespace tavrin::replay

@@ -1,0 +1,156 @@
+// tavrin-replay: types a corpus into a running daemon as its users did, and reports how it was answered.
+
+#include <cstdio>
+#include <cstdlib>
+#include <ctime>
+#include <list>
+#include <memory>
+#include <unistd.h>
+
+#include <CLI/CLI.hpp>
+#include <fmt/format.h>
+
+#include "CoreTavrin/TAVBag.h"
+#include "CoreTavrin/TAVRequest.h"
+#include "CoreTavrin/TAVSessionConfiguration.h"
+#include "platform/Files.h"
+#include "platform/Text.h"
+#include "tools/replay/Corpus.h"
+#include "tools/replay/Report.h"
+
+namespace tavrin::replay {
+
+namespace {
+
+constexpr std::size_t kLargestCorpus = 16 << 20;
+
+struct Options {
+    std::string corpus;
+    std::string address = TAVClient::defaultAddress();
+    std::string identifier = "com.quorvane.tavrin-replay";
+    double speed = 1;
+    bool lockstep = false;
+    std::size_t queries = 0;
+    double timeout = 30;
+    bool json = false;
+};
+
+[[noreturn]] void fail(const std::string& what)
+{
+    fmt::print(stderr, "tavrin-replay: {}\n", what);
+    std::exit(2);
+}
+
+template <class T> T valueOf(platform::Result<T> result, std::string_view what)
+{
+    if (!result) fail(fmt::format("{}: {}", what, result.error().reason()));
+    return std::move(*result);
+}
+
+double now()
+{
+    timespec time{};
+    clock_gettime(CLOCK_MONOTONIC, &time);
+    return static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_nsec) * 1e-9;
+}
+
+/// A client that sends a search for each key and takes the answers as they come.
+class Replay {
+public:
+    explicit Replay(const Options& options)
+        : _options(options), _client(valueOf(TAVClient::connect(options.address), options.address))
+    {
+        _client->setTimeout(platform::durationFromSeconds(options.timeout));
+        (void)valueOf(_client->configure({options.identifier, "tavrin-replay/1"}), "configure");
+        for (int attempt = 0; attempt < 10 && !_bag; ++attempt) // each waits a second for the first one
+            _bag = valueOf(_client->bag(), "the bag").bag;
+        if (!_bag) fail("the daemon has no bag");
+    }
+
+    Report run(const std::vector<TypedQuery>& queries)
+    {
+        double due = now();
+        for (std::size_t i = 0; i < queries.size(); ++i) {
+            for (const Keystroke& key : queries[i].keys) {
+                due += std::chrono::duration<double>(key.pause).count() / _options.speed;
+                if (!_options.lockstep) takeAnswers([&] { return now() >= due; }, due - now());
+                if (!key.text.empty()) send(key.text);
+                if (_options.lockstep) takeAnswers([&] { return _underWay.empty(); }, _options.timeout);
+            }
+            if (i % 10 == 9 && _showProgress) fmt::print(stderr, "\r{} of {} queries ", i + 1, queries.size());
+        }
+        takeAnswers([&] { return _underWay.empty(); }, _options.timeout);
+        for (const Search& search : _underWay) _report.addUnanswered(search);
+        if (_showProgress) fmt::print(stderr, "\n");
+        return std::move(_report);
+    }
+
+private:
+    void takeAnswers(const std::function<bool()>& done, double seconds)
+    {
+        if (!_client->wait(done, platform::durationFromSeconds(std::max(seconds, 0.0))) && !_client->connected())
+            fail("the daemon closed the connection");
+    }
+
+    void send(const std::string& text)
+    {
+        for (Search& earlier : _underWay) earlier.overtaken = true;
+        auto request = TAVSearchRequest::searchRequestWithString(text, StartSearchTrigger::NewCharacter);
+        request->queryId = ++_lastQueryId;
+        request->verboseReply = true; // it tells the cache's answers from the service's
+        const auto search = _underWay.insert(_underWay.end(), {.queryId = _lastQueryId, .text = text});
+        search->tooShort = !_bag->isEnabled() || platform::utf16Length(text) < _bag->minimumQueryLength();
+        search->sent = now();
+        _client->send(*request, [this, search](const platform::Result<TAVAnswer>& answer) {
+            search->answered = now();
+            _report.add(*search, answer);
+            _underWay.erase(search);
+        });
+    }
+
+    const Options& _options;
+    const bool _showProgress = isatty(STDERR_FILENO) == 1;
+    std::unique_ptr<TAVClient> _client;
+    std::shared_ptr<const TAVBag> _bag;
+    std::list<Search> _underWay;
+    std::int64_t _lastQueryId = 0;
+    Report _report;
+};
+
+int run(const Options& options)
+{
+    const auto path = std::filesystem::absolute(options.corpus);
+    const auto bytes = valueOf(platform::makeSystemFiles()->read(path, kLargestCorpus), "the corpus");
+    auto queries = valueOf(parseCorpus(bytes.view()), options.corpus);
+    if (options.queries > 0 && options.queries < queries.size()) queries.resize(options.queries);
+    const Report report = Replay(options).run(queries);
+    fmt::print("{}", options.json ? platform::toJson(report.json(), platform::JsonStyle::Pretty) + "\n" : report.text());
+    return report.stale().empty() && report.failed().empty() ? EXIT_SUCCESS : EXIT_FAILURE;
+}
+
+} // namespace
+} // namespace tavrin::replay
+
+int main(int argc, char** argv)
+{
+    using namespace tavrin::replay;
+    Options options;
+    CLI::App app("Types a corpus of queries into the daemon, key by key, and reports hits, requests saved, stale answers and "
+                 "latencies. Ends with 1 where an answer was stale or failed.");
+    app.add_option("corpus", options.corpus, "The corpus: tools/replay/corpus.txt, or one of its form")->required();
+    app.add_option("--address", options.address, "The daemon's D-Bus address")->capture_default_str();
+    app.add_option("--identifier", options.identifier, "Client identifier to introduce oneself with")
+        ->capture_default_str();
+    CLI::Option* speed = app.add_option("--speed", options.speed, "Type so many times as fast as the users did")
+                             ->check(CLI::Range(0.01, 100000.0))
+                             ->capture_default_str();
+    app.add_flag("--lockstep", options.lockstep, "No pauses: each key as soon as the one before it is answered")
+        ->excludes(speed);
+    app.add_option("-n,--queries", options.queries, "Only the first so many queries; 0 is all");
+    app.add_option("--timeout", options.timeout, "Seconds to wait for an answer")
+        ->check(CLI::Range(0.001, 86400.0))
+        ->capture_default_str();
+    app.add_flag("--json", options.json, "Report in JSON");
+    CLI11_PARSE(app, argc, argv);
+    return run(options);
+}
