@@ -243,9 +243,12 @@ void ClientConnection::search(std::shared_ptr<TAVSearchRequest> request, Request
     TAVTrace(kTraceSearchStart, static_cast<std::uint64_t>(queryId));
     RequestReply answer = traced(std::move(reply), kTraceSearchAnswer);
 
-    std::int64_t current = _currentQueryId;
-    if (queryId <= current || !_currentQueryId.compare_exchange_strong(current, queryId))
-        return answer(queryId, nullptr, {});
+    const bool accepted = [&] {
+        std::lock_guard order(_orderMutex);
+        std::int64_t current = _currentQueryId;
+        return queryId > current && _currentQueryId.compare_exchange_strong(current, queryId);
+    }();
+    if (!accepted) return answer(queryId, nullptr, {});
 
     auto shared = std::make_shared<RequestReply>(std::move(answer));
     _state->search(std::move(request),
@@ -253,6 +256,7 @@ void ClientConnection::search(std::shared_ptr<TAVSearchRequest> request, Request
                                  shared](std::int64_t, std::shared_ptr<TAVReply> record, OptionalError error) {
                        auto self = weak.lock();
                        if (!self) return shared->abandon();
+                       std::lock_guard order(self->_orderMutex);
                        if (self->_currentQueryId > queryId) return (*shared)(queryId, nullptr, {});
                        (*shared)(queryId, std::move(record), std::move(error));
                    }));

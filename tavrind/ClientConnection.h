@@ -75,6 +75,7 @@ private:
     mutable std::mutex _mutex; // for the two below, which are written on the connection's queue and read anywhere
     std::shared_ptr<TAVSessionConfiguration> _configuration;
     std::shared_ptr<ClientState> _state;
+    std::mutex _orderMutex; // so that no query is accepted between an answer's check and its delivery
     std::atomic<std::int64_t> _currentQueryId = 0;
     platform::NotificationCenter::Token _bagObserver;
 };
