@@ -6,6 +6,7 @@
 #include "platform/Text.h"
 #include "tavrind/QueryCache.h"
 #include "tavrind/TavrinUserGUIDController.h"
+#include "tests/support/CacheModel.h"
 #include "tests/support/DaemonFixture.h"
 
 namespace tavrin::test {
@@ -217,50 +218,6 @@ TEST_F(QueryCacheTest, ASetOutlivesTheCache)
     EXPECT_EQ(device.memoryPressure.watchers, 0);
 }
 
-// The rules once more, each spelled out over a plain list.
-struct Model {
-    struct Entry {
-        std::string query, input;
-        double scale, score;
-        std::optional<Date> expires;
-    };
-    std::vector<Entry> entries; // in order of their queries
-    std::size_t cost = 0;
-
-    void put(Entry entry, std::size_t jsonSize)
-    {
-        if (entry.input.size() > entry.query.size()) return;
-        const std::size_t added = jsonSize * 3 / 2;
-        if (added >= 0x200000) return;
-        if (cost + added >= 0x200000) clear();
-        std::erase_if(entries, [&](const Entry& other) { return other.query == entry.query; });
-        entries.push_back(std::move(entry));
-        std::ranges::sort(entries, {}, &Entry::query);
-        cost += added;
-    }
-    void clear()
-    {
-        entries.clear();
-        cost = 0;
-    }
-    /// The identity of the set that answers.
-    std::optional<double> get(const std::string& text, double scale, Date now)
-    {
-        std::erase_if(entries, [&](const Entry& entry) {
-            return entry.query.starts_with(text) && entry.expires && *entry.expires <= now;
-        });
-        const Entry* best = nullptr;
-        for (const Entry& entry : entries) {
-            if (!entry.query.starts_with(text) || text.size() < entry.input.size()) continue;
-            if (scale > 0 && scale != entry.scale) continue;
-            if (best && entry.query.size() > best->query.size()) continue;
-            if (best && entry.query.size() == best->query.size() && entry.score <= std::max(best->score, 0.0)) continue;
-            best = &entry;
-        }
-        return best ? std::optional(best->score) : std::nullopt;
-    }
-};
-
 TEST_F(QueryCacheTest, FollowsItsRulesThroughWhateverHappens)
 {
     std::mt19937 random(11);
@@ -270,7 +227,7 @@ TEST_F(QueryCacheTest, FollowsItsRulesThroughWhateverHappens)
         for (int length = 1 + upTo(longest - 1); length > 0; --length) result += static_cast<char>('a' + upTo(2));
         return result;
     };
-    Model model;
+    CacheModel model;
     int hits = 0;
     for (int i = 0; i < 20'000; ++i) {
         const Date now = device.clock.wallNow();
@@ -293,8 +250,7 @@ TEST_F(QueryCacheTest, FollowsItsRulesThroughWhateverHappens)
             Dictionary set = sized(query, upTo(40) ? 200 : 200'000 + static_cast<std::size_t>(upTo(1'400'000)));
             set.set("completion_score", score);
             if (maxAge) set.set("max_age", maxAge);
-            const auto expires = maxAge ? std::optional(now + std::chrono::seconds(maxAge)) : std::nullopt;
-            model.put({query, input, scale, static_cast<float>(score), expires}, platform::jsonSize(set));
+            model.put(input, scale, set, now);
             put(input, std::move(set), scale);
             break;
         }
@@ -304,7 +260,7 @@ TEST_F(QueryCacheTest, FollowsItsRulesThroughWhateverHappens)
             request.scale = upTo(3);
             const auto set = cache->getRequest(request);
             const auto expected = model.get(request.queryString, request.scale, now);
-            ASSERT_EQ(set ? std::optional<double>(set->completionScore) : std::nullopt, expected)
+            ASSERT_EQ(set ? set->resultSet : Value(), expected ? expected->set : Value())
                 << i << ": " << request.queryString << " " << request.scale;
             hits += set ? 1 : 0;
         }

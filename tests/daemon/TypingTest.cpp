@@ -1,0 +1,349 @@
+// Users who type, over the whole road of a search: a corpus of real shape beside a model of the cache, and random schedules of
+// everything that can happen on the way.
+
+#include <cstdlib>
+#include <random>
+#include <set>
+
+#include "platform/Files.h"
+#include "platform/JsonDocument.h"
+#include "tests/support/CacheModel.h"
+#include "tests/support/DaemonFixture.h"
+#include "tools/replay/Corpus.h"
+
+namespace tavrin::test {
+namespace {
+
+using namespace std::chrono_literals;
+using platform::Error;
+
+using Task = platform::test::FakeUrlLoader::Task;
+
+/// The text that a task searches for; none for other requests.
+std::optional<std::string> searchedFor(const Task& task)
+{
+    const platform::Url& url = task.originalRequest().url;
+    return url.string().starts_with("https://s.example/search") ? url.queryValue("q") : std::nullopt;
+}
+
+/// The result sets of an answer with a reply; null for one without.
+Value setsIn(FakeCall& call)
+{
+    const Value raw = call.argument(1)["rawResponse"];
+    return raw.asBytes() ? platform::parseJson(raw.asBytes()->view()).value_or(Value()) : Value();
+}
+
+struct TypingTest : DaemonTest {
+    TypingTest()
+    {
+        start();
+        deliverBag();
+    }
+};
+
+/// A service that completes what is typed to the next end of a word, with sets large enough to fill a cache.
+class Completions {
+public:
+    explicit Completions(const std::vector<replay::TypedQuery>& queries)
+    {
+        for (const auto& query : queries) _titles.insert(platform::lowerCased(query.wanted));
+    }
+    Value::Array answer(const std::string& typed)
+    {
+        const std::string lower = platform::lowerCased(typed);
+        std::set<std::string> completed;
+        for (auto title = _titles.lower_bound(lower); title != _titles.end() && title->starts_with(lower); ++title)
+            completed.insert(title->substr(0, title->find(' ', lower.size())));
+        Value::Array sets;
+        for (const std::string& query : completed) {
+            if (sets.size() == 3) break;
+            ++_serial;
+            sets.push_back(Value::dictionaryOf({{"query", query},
+                                                {"serial", _serial},
+                                                {"max_age", _serial % 5 ? 60 : 0},
+                                                {"completion_score", _serial % 4 - 1},
+                                                {"results", std::string(8000, 'r')}}));
+        }
+        return sets;
+    }
+
+private:
+    std::set<std::string> _titles;
+    int _serial = 0;
+};
+
+TEST_F(TypingTest, TheCorpusHitsWhatTheRulesSay)
+{
+    const auto corpus = platform::makeSystemFiles()->read(SOURCE_DIR "/tools/replay/corpus.txt", 1 << 20).value();
+    const auto queries = replay::parseCorpus(corpus.view()).value();
+    Completions service(queries);
+    CacheModel model;
+    const auto token = device.notifications.observe("TAVUserGUIDChangeNotification", [&](auto&) { model.clear(); });
+
+    auto connection = client();
+    std::int64_t queryId = 0;
+    int hits = 0, requests = 0;
+    struct UnderWay {
+        std::shared_ptr<Task> task;
+        std::string text;
+        platform::Date due;
+    };
+    std::vector<UnderWay> underWay;
+    const auto letPass = [&](platform::Duration time) {
+        const platform::Date end = device.clock.wallNow() + time;
+        while (!underWay.empty() && underWay.front().due <= end) {
+            device.advance(underWay.front().due - device.clock.wallNow());
+            const UnderWay done = std::move(underWay.front());
+            underWay.erase(underWay.begin());
+            const Value::Array sets = service.answer(done.text);
+            done.task->respond(200, platform::toJson(sets));
+            device.drain();
+            for (const Value& set : sets) model.put(done.text, 2, set, device.clock.wallNow());
+        }
+        device.advance(end - device.clock.wallNow());
+    };
+
+    for (const auto& query : queries) {
+        for (const auto& key : query.keys) {
+            letPass(key.pause);
+            if (platform::utf16Length(key.text) < 2) continue; // the bag's minimum
+            const auto* expected = model.get(key.text, 2, device.clock.wallNow());
+            const Value set = expected ? expected->set : Value();
+            const std::size_t before = tasks().size();
+            auto call = search(*connection, ++queryId, key.text);
+            if (expected) {
+                ASSERT_EQ(setsIn(*call), Value(Value::Array{set})) << key.text;
+                ASSERT_EQ(tasks().size(), before) << key.text;
+                ++hits;
+            } else {
+                ASSERT_TRUE(call->pending() && tasks().size() == before + 1) << key.text;
+                underWay.push_back({lastTask(), key.text, device.clock.wallNow() + 180ms});
+                ++requests;
+            }
+        }
+    }
+    EXPECT_EQ(counter("vistrel.ondevicecachehits"), hits);
+    EXPECT_GT(hits, requests) << "most requests are saved";
+    EXPECT_GT(model.flushes, 0) << "the corpus fills the cache";
+}
+
+/// One schedule of a few users: what they send, what the service does and when, and what the device does meanwhile.
+class Schedule {
+public:
+    Schedule(DaemonTest& test, std::uint32_t seed) : _test(test), _random(seed), _name(std::to_string(seed))
+    {
+        for (int i = 0; i < 2; ++i) connect(_users.emplace_back());
+    }
+
+    void run()
+    {
+        for (int i = 0; i < 40 && !testing::Test::HasFailure(); ++i) {
+            step();
+            _test.device.drain();
+            judge();
+        }
+        while (auto task = anyTask()) {
+            respond(*task);
+            _test.device.drain();
+            judge();
+        }
+        for (User& user : _users) {
+            for (const Call& call : user.calls) EXPECT_TRUE(call.call->answered()) << call.text << " isn't answered";
+            disconnect(user);
+        }
+        for (const Call& call : _gone) EXPECT_FALSE(call.call->pending()) << call.text << " keeps its slot";
+    }
+
+private:
+    struct Call {
+        std::shared_ptr<FakeCall> call;
+        std::int64_t id;
+        std::string text;
+        bool newest; ///< when it was sent; a service's answer must find it so, too
+        bool withItems;
+        bool judged = false;
+    };
+    struct User {
+        std::shared_ptr<FakeConnection> connection;
+        std::string text;
+        std::int64_t newest = 0;
+        std::vector<Call> calls;
+    };
+
+    unsigned upTo(unsigned limit) { return static_cast<unsigned>(_random() % (limit + 1)); }
+    bool oneIn(unsigned count) { return upTo(count - 1) == 0; }
+    User& anyUser() { return _users[upTo(static_cast<unsigned>(_users.size()) - 1)]; }
+
+    void connect(User& user)
+    {
+        // Users of one identifier share a cache.
+        user.connection = _test.client("com.quorvane.vistrel." + _name, oneIn(4) ? "Vistrel/5" : "Vistrel/4");
+    }
+    void disconnect(User& user)
+    {
+        user.connection->end();
+        _test.device.drain();
+        for (Call& call : user.calls) _gone.push_back(std::move(call));
+        user = User();
+    }
+
+    void step()
+    {
+        switch (upTo(19)) {
+        case 0:
+            _test.device.advance(std::chrono::seconds(upTo(40)));
+            break;
+        case 1: {
+            User& user = anyUser();
+            disconnect(user);
+            connect(user);
+            break;
+        }
+        case 2:
+            if (oneIn(3)) _test.device.locale.handler(platform::LocaleSource::Change::Locale);
+            else if (oneIn(2)) _test.device.memoryPressure.raise();
+            else (void)_test.configure(*anyUser().connection, "com.quorvane.vistrel." + _name, "Vistrel/6");
+            break;
+        case 3: // several keys before the daemon runs
+            for (unsigned i = upTo(3); i < 4; ++i) key(anyUser());
+            break;
+        case 4:
+        case 5:
+        case 6:
+        case 7:
+        case 8:
+        case 9:
+            if (auto task = anyTask()) respond(*task);
+            break;
+        default: key(anyUser());
+        }
+    }
+
+    void key(User& user)
+    {
+        if (!user.text.empty() && oneIn(3)) user.text.pop_back();
+        else user.text += oneIn(8) ? 'A' : static_cast<char>('a' + upTo(2));
+        const bool outOfOrder = oneIn(12);
+        const std::int64_t id = user.newest + (outOfOrder ? -static_cast<int>(upTo(3)) : 1 + static_cast<int>(upTo(2)));
+        Dictionary fields{{"queryString", user.text},
+                          {"class", "TAVSearchRequest"},
+                          {"queryId", id},
+                          {"scale", oneIn(6) ? 3.0 : 2.0},
+                          {"keyboardInputMode", "de"},
+                          {"verboseReply", true}};
+        const bool withItems = oneIn(10);
+        if (withItems)
+            fields.set("queryItems", Value::Array{Value::dictionaryOf(
+                                         {{"class", "TAVQueryItem"}, {"name", "x"}, {"value", "y"}})});
+        const bool newest = id > user.newest;
+        user.newest = std::max(user.newest, id);
+        user.calls.push_back({user.connection->call("Request", {std::move(fields)}), id, user.text, newest, withItems});
+    }
+
+    std::shared_ptr<Task> anyTask()
+    {
+        std::vector<std::shared_ptr<Task>> waiting;
+        for (const auto& task : _test.tasks())
+            if (!task->finished && searchedFor(*task)) waiting.push_back(task);
+        return waiting.empty() ? nullptr : waiting[upTo(static_cast<unsigned>(waiting.size()) - 1)];
+    }
+    void respond(Task& task)
+    {
+        const std::string text = *searchedFor(task);
+        const platform::Date now = _test.device.clock.wallNow();
+        switch (upTo(11)) {
+        case 0: return task.fail(Error::withReason("x", 1, "the network is gone"));
+        case 1: return task.cancel();
+        case 2: return task.respond(200, "no JSON");
+        case 3: return task.finish(platform::Bytes("[]"), std::nullopt, std::nullopt);
+        default: break;
+        }
+        Value::Array sets;
+        for (unsigned i = upTo(2); i < 3; ++i) {
+            std::string query = text;
+            for (unsigned more = upTo(2); more > 0; --more) query += static_cast<char>('a' + upTo(2));
+            Dictionary set{{"query", query}, {"input", text}, {"completion_score", static_cast<int>(upTo(2))}};
+            set.set("made", platform::secondsSince1970(now));
+            if (oneIn(2)) set.set("max_age", 20);
+            if (oneIn(9)) set.set("status", "ERROR");
+            sets.emplace_back(std::move(set));
+        }
+        task.respond(oneIn(9) ? 500 : 200, platform::toJson(sets));
+    }
+
+    /// Looks at what was answered in this step.
+    void judge()
+    {
+        for (User& user : _users)
+            for (Call& call : user.calls) {
+                if (call.judged || !call.call->answered()) continue;
+                call.judged = true;
+                const Value reply = call.call->argument(1);
+                EXPECT_EQ(call.call->argument(0), Value(call.id));
+                if (reply.count() == 0) continue;
+                EXPECT_TRUE(call.newest) << call.text << " was no news when it came, and got an answer";
+                if (reply["httpResponse"].count() > 0) judgeFromService(user, call);
+                else judgeFromCache(call, reply);
+            }
+    }
+    void judgeFromService(const User& user, Call& call)
+    {
+        EXPECT_EQ(call.id, user.newest) << call.text << " was overtaken, and got an answer";
+        const Value sets = setsIn(*call.call);
+        for (std::size_t i = 0; i < sets.count(); ++i) EXPECT_EQ(sets[i]["input"], Value(call.text));
+    }
+    void judgeFromCache(Call& call, const Value& reply)
+    {
+        const Value set = setsIn(*call.call)[0];
+        const std::string typed = platform::lowerCased(call.text);
+        const auto lower = [&](const char* key) {
+            return set[key].asString() ? platform::lowerCased(*set[key].asString()) : "?";
+        };
+        EXPECT_TRUE(lower("query").starts_with(typed) && typed.starts_with(lower("input")))
+            << call.text << " got " << platform::toJson(set);
+        const double age = platform::secondsSince1970(_test.device.clock.wallNow()) - set["made"].asDouble().value_or(0);
+        EXPECT_LT(age, set["max_age"].asDouble().value_or(1e9)) << call.text;
+        EXPECT_NE(set["status"], Value("ERROR"));
+        EXPECT_FALSE(call.withItems) << call.text << " has items of its own";
+        const std::string* scale = reply["httpRequest"]["headers"]["X-Quorvane-UI-Scale"].asString();
+        EXPECT_EQ(scale ? std::strtod(scale->c_str(), nullptr) : 0, reply["scale"].asDouble());
+        ++hits;
+    }
+
+    DaemonTest& _test;
+    std::mt19937 _random;
+    const std::string _name;
+    std::vector<User> _users;
+    std::vector<Call> _gone; // of connections that ended
+
+public:
+    int hits = 0;
+};
+
+// SCHEDULES=100000 SEED=1 tests/daemon_tests --gtest_filter=TypingTest.NoScheduleMakesAStaleAnswer
+TEST_F(TypingTest, NoScheduleMakesAStaleAnswer)
+{
+    const auto number = [](const char* name, int otherwise) {
+        const char* text = std::getenv(name);
+        return text ? std::atoi(text) : otherwise;
+    };
+    const int schedules = number("SCHEDULES", 1000);
+    const int first = number("SEED", 1);
+    int hits = 0;
+    for (int i = 0; i < schedules; ++i) {
+        if (i % 25 == 24) { // a daemon keeps its clients' states for its life
+            start();
+            if (tasks().size() > 0 && !lastTask()->finished) deliverBag();
+        }
+        SCOPED_TRACE("SEED=" + std::to_string(first + i) + " SCHEDULES=1");
+        Schedule schedule(*this, static_cast<std::uint32_t>(first + i));
+        schedule.run();
+        hits += schedule.hits;
+        session->records.clear();
+        ASSERT_FALSE(HasFailure());
+    }
+    EXPECT_GT(hits, schedules / 2);
+}
+
+} // namespace
+} // namespace tavrin::test
