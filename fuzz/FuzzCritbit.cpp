@@ -3,24 +3,25 @@
 #include "fuzz/Check.h"
 #include "tests/support/CritbitModel.h"
 
-/// Each line is an operation on a tree: its first byte says which, the rest is the key or prefix. The tree must do what
-/// a map does.
+/// The input is a list of operations on a tree: a byte that says which, one with the length of the key or prefix, and its
+/// bytes, of any value. The tree must do what a map does.
 int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
 {
     tavrin::test::CritbitModel model;
     std::string_view rest = textOf(data, size);
-    while (!rest.empty()) {
-        const std::string line(rest.substr(0, rest.find('\n')));
-        rest.remove_prefix(std::min(rest.size(), line.size() + 1));
-        if (line.empty()) continue;
-        const std::string key = line.substr(1);
-        switch (line[0]) {
+    while (rest.size() >= 2) {
+        const char operation = rest[0];
+        const std::size_t length = static_cast<unsigned char>(rest[1]);
+        const std::string key(rest.substr(2, length));
+        rest.remove_prefix(std::min(rest.size(), 2 + length));
+        switch (operation) {
         case '-': check(model.remove(key), key); break;
         case '?': check(model.walk(key), key); break;
         case '3': check(model.walk(key, 3), key); break;
-        case '!': check(model.clear()); break;
+        case '!': check(model.walk(key, 2, 5), key); break;
+        case '0': check(model.clear()); break;
         case '=': check(model.insert(key, 9, true), key); break;
-        default: check(model.insert(key, static_cast<unsigned char>(line[0]), line[0] & 1), key); break;
+        default: check(model.insert(key, static_cast<unsigned char>(operation), operation & 1), key); break;
         }
     }
     check(model.walk("") && model.clear());
