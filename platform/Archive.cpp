@@ -298,6 +298,25 @@ public:
         }
     }
 
+    bool isRecord() override
+    {
+        const Token first = here();
+        if (first.type != Value::Type::Dictionary || first.size == 0) return false;
+        const char* const contents = _next;
+        const std::uint64_t valuesLeft = _valuesLeft;
+        const auto isText = [this] {
+            _isRead = false;
+            return here().type == Value::Type::String;
+        };
+        const bool isClass = isText() && _here.text() == kClassKey && isText();
+        // Back to where it was.
+        _here = first;
+        _isRead = true;
+        _next = contents;
+        _valuesLeft = valuesLeft;
+        return isClass;
+    }
+
     std::string_view beginRecord() override
     {
         const std::uint32_t size = here().size;

@@ -126,13 +126,17 @@ std::shared_ptr<Record> decodeRecord(Decoder& decoder)
     return decoder.failed() ? nullptr : record;
 }
 
-std::shared_ptr<Record> decodeRecordIfKnown(Decoder& decoder)
+std::shared_ptr<Record> decodeRecordIf(Decoder& decoder, bool (*wanted)(const Record&))
 {
-    const std::string_view className = decoder.beginRecord();
-    auto record = decoder.classes().make(className);
-    if (record) {
+    if (!decoder.isRecord()) {
+        decoder.skip();
+        return nullptr;
+    }
+    auto record = decoder.classes().make(decoder.beginRecord());
+    if (record && wanted(*record)) {
         decodeFields(decoder, *record);
     } else {
+        record = nullptr;
         std::string_view key;
         while (decoder.nextKey(key)) decoder.skip();
     }

@@ -78,6 +78,8 @@ public:
     virtual Date date() = 0;
     virtual Value value() = 0;
     virtual void skip() = 0;
+    /// Whether there is a record at hand; nothing is taken. A dictionary that names no class is none.
+    virtual bool isRecord() = 0;
     /// Enters a record and answers its class name, which lives as long as what is decoded. `nextKey` then moves from key to key, and leaves at the end.
     virtual std::string_view beginRecord() = 0;
     /// False at the end of the record, which is then left. The view lives as long as what is decoded.
@@ -175,8 +177,15 @@ void encodeRecord(Encoder& encoder, const Record& record);
 
 /// Reads a record of any known class; null after a failure.
 [[nodiscard]] std::shared_ptr<Record> decodeRecord(Decoder& decoder);
-/// The same, but a record of an unknown class is skipped: null, and no failure.
-[[nodiscard]] std::shared_ptr<Record> decodeRecordIfKnown(Decoder& decoder);
+/// Reads a record of a known class that is wanted (the record is fresh). Whatever else is at hand is skipped: null, and
+/// no failure.
+[[nodiscard]] std::shared_ptr<Record> decodeRecordIf(Decoder& decoder, bool (*wanted)(const Record&));
+/// The same for a record that is a `T`.
+template <class T> [[nodiscard]] std::shared_ptr<T> decodeRecordIfA(Decoder& decoder)
+{
+    const auto isA = [](const Record& record) { return dynamic_cast<const T*>(&record) != nullptr; };
+    return std::dynamic_pointer_cast<T>(decodeRecordIf(decoder, isA));
+}
 /// Reads the record at hand into `record`, which must be of the class found there.
 void decodeRecordInto(Decoder& decoder, Record& record);
 

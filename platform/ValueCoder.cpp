@@ -87,6 +87,7 @@ public:
     }
     Value value() override { return *_here; }
     void skip() override {}
+    bool isRecord() override { return !failed() && (*_here)[kClassKey].asString(); }
 
     std::string_view beginRecord() override
     {

@@ -55,7 +55,7 @@ void TavrinFeedback::process(SessionProcessingHelper& helper)
 bool TavrinFeedback::decodeField(std::string_view key, platform::Decoder& decoder, std::size_t& next)
 {
     if (key != "feedback") return RecordOf::decodeField(key, decoder, next);
-    feedback = decoder.null() ? nullptr : std::dynamic_pointer_cast<ZRFeedback>(platform::decodeRecordIfKnown(decoder));
+    feedback = platform::decodeRecordIfA<ZRFeedback>(decoder);
     return true;
 }
 

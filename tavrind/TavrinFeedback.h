@@ -67,7 +67,7 @@ struct TavrinFeedback : platform::RecordOf<TavrinFeedback> {
             platform::field("timestamp", &Self::relTimestamp), platform::field("user_guid", &Self::userGuid),
             platform::field("user_agent", &Self::userAgent),   platform::field("_clientQueryId", &Self::clientQueryId)};
     }
-    /// As for any record, but a record in "feedback" that is none of an event reads as null.
+    /// As for any record, but whatever is in "feedback" that is no event's record reads as null.
     bool decodeField(std::string_view key, platform::Decoder& decoder, std::size_t& next) override;
 
 private:

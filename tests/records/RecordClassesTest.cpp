@@ -208,17 +208,26 @@ TEST(RecordClasses, FieldsRefuseRecordsOfOtherClasses)
 
 TEST(RecordClasses, AnEventSurvivesARecordThatIsNoneOfAnEvent)
 {
-    for (const char* name : {"ZRLater", "ZRSearchResult"}) {
-        const Value inner =
-            Dictionary{{"class", name}, {"x", Dictionary{{"class", "ZRLater"}}}, {"y", Value::Array{1}}};
+    const auto record = [](const char* name) {
+        return Dictionary{{"class", name}, {"x", Dictionary{{"class", "ZRLater"}}}, {"rankingScore", "broken"}};
+    };
+    for (const Value& inner : {Value(record("ZRLater")), Value(record("ZRSearchResult")), Value("ZRClearInputFeedback"),
+                               Value(7), Value(0.5), Value(true), Value(Bytes("x")), Value(nullptr),
+                               Value(Value::Array{1, record("ZRClearInputFeedback")}), Value(Dictionary()),
+                               Value(Dictionary{{"x", Dictionary{{"class", "ZRLater"}}}}),
+                               Value(Dictionary{{"class", 5}, {"triggerEvent", 1}})}) {
         const Value value = Dictionary{{"class", "TavrinFeedback"}, {"feedback", inner}, {"query_id", 7}};
         for (const auto& decoded : decodedBothWays(value)) {
             ASSERT_TRUE(decoded) << decoded.error().description();
             const auto& event = dynamic_cast<const TavrinFeedback&>(**decoded);
-            EXPECT_EQ(event.feedback, nullptr);
+            EXPECT_EQ(event.feedback, nullptr) << platform::toJson(inner);
             EXPECT_EQ(event.queryId, 7);
         }
     }
+    // A broken record of an event is damage.
+    const Value broken = Dictionary{{"class", "ZRClearInputFeedback"}, {"triggerEvent", "x"}};
+    for (const auto& decoded : decodedBothWays(Dictionary{{"class", "TavrinFeedback"}, {"feedback", broken}}))
+        EXPECT_THAT(decoded.error().reason(), StartsWith("feedback.triggerEvent: "));
 }
 
 TEST(RecordClasses, FieldsKeepWhatSubclassesAdd)

@@ -89,6 +89,7 @@ public:
         return any;
     }
     void skip() override {}
+    bool isRecord() override { return true; }
     std::string_view beginRecord() override
     {
         const auto record = classes().make(_nested);
