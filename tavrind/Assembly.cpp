@@ -9,8 +9,9 @@ Assembly::Assembly(platform::Device& device_)
     : device(device_), diagnosticData(device_.counters),
       feedbackBooks(device_.files, device_.directories.state / "com.quorvane.tavrind" / "feedback-books.json",
                     device_.serialQueue("com.quorvane.tavrind.feedbackBooks", platform::Priority::Background)),
-      userDefaults(device_.userDefaults), fileManager(device_.files),
-      notificationCenter(device_.notifications), sharedSession(device_.userDefaults.boolean("TAVSharedSession"))
+      userDefaults(device_.userDefaults), fileManager(device_.files), notificationCenter(device_.notifications),
+      dateQueue(device_.serialQueue("com.quorvane.tavrind.firstUseQueue")),
+      sharedSession(device_.userDefaults.boolean("TAVSharedSession"))
 {}
 
 Assembly::~Assembly() = default;

@@ -10,6 +10,7 @@ class BackgroundSession;
 struct Device;
 class FileSystem;
 class NotificationCenter;
+class Queue;
 class UrlSession;
 class UserDefaults;
 } // namespace platform
@@ -59,6 +60,7 @@ struct Assembly {
     std::shared_ptr<BackgroundActivitiesManager> backgroundFlusher;
     std::shared_ptr<TavrinUserGUIDController> guidController;
     std::shared_ptr<ClientSessionManager> clientSessionManager;
+    std::shared_ptr<platform::Queue> dateQueue; ///< sessions settle on it, one by one, which is the day's first
     std::shared_ptr<Lookup> lookup;
     bool sharedSession;         ///< all clients share one session and one GUID
     bool testFeedbacks = false; ///< sessions keep their feedback in memory too

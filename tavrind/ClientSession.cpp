@@ -2,7 +2,6 @@
 
 #include <algorithm>
 #include <array>
-#include <mutex>
 
 #include "CoreTavrin/TAVError.h"
 #include "platform/Calendar.h"
@@ -70,7 +69,7 @@ ClientSession::ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback>
     _header.previousSessionEndReason = previousSessionEndReason;
     _header.baseTime = assembly.device.clock.wallNow();
     assembly.diagnosticData.addValue(1, createCounterKey(_header.agent, "sessions"));
-    _header.firstUse = _firstUseOfTheDay();
+    _header.firstUse = assembly.dateQueue->sync([this] { return _firstUseOfTheDay(); });
     if (assembly.downloadManager) _header.resourceVersions = assembly.downloadManager->resourceVersions();
     if (assembly.persistentStorage) _storageHandle = assembly.persistentStorage->createFileContainerForWriting();
     if (_storageHandle) _storageHandle->writeSessionHeader(_header);
@@ -81,8 +80,6 @@ ClientSession::~ClientSession() = default;
 
 bool ClientSession::_firstUseOfTheDay()
 {
-    static std::mutex oneAtATime; // of two sessions that begin at once, one is the first of the day
-    const std::lock_guard lock(oneAtATime);
     const auto key = firstUseKey(_header.agent);
     const auto firstUseDate = key ? _assembly.userDefaults.date(*key) : std::nullopt;
     const std::string zone = _assembly.device.locale.timeZone();

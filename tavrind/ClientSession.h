@@ -67,6 +67,7 @@ public:
 
 private:
     void _write(std::shared_ptr<TavrinFeedback> feedback);
+    // On the assembly's dateQueue.
     [[nodiscard]] bool _firstUseOfTheDay();
     [[nodiscard]] bool _updateFirstUseDate();
 

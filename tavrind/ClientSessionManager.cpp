@@ -124,13 +124,19 @@ void ClientSessionManager::_updateState(std::shared_ptr<TavrinFeedback> feedback
 {
     _sessionQueue->assertOnQueue();
     Occasion occasion{std::move(feedback), std::move(callback)};
+    bool known = false;
     for (const Transition& transition : kTransitions) {
-        if (transition.event != event || std::ranges::find(transition.states, _currentState) == transition.states.end())
-            continue;
+        if (transition.event != event) continue;
+        known = true;
+        if (std::ranges::find(transition.states, _currentState) == transition.states.end()) continue;
         (this->*transition.action)(occasion);
         if (transition.next) _currentState = *transition.next;
         return;
     }
+    if (!known)
+        log().debug("External event received {}", static_cast<unsigned>(event));
+    else if (event == SessionEvent::AddFeedback)
+        log().log("Avoided adding feedback in state {}", static_cast<unsigned>(_currentState));
 }
 
 void ClientSessionManager::_nothing(Occasion&) {}
@@ -259,10 +265,10 @@ platform::Date ClientSessionManager::expirationTime()
     return _sessionQueue->sync([this] { return _expirationTime; });
 }
 
-void ClientSessionManager::flushSession(std::move_only_function<void()> callback)
+void ClientSessionManager::externalEvent(SessionEvent event, std::move_only_function<void()> callback)
 {
-    _sessionQueue->async([self = shared_from_this(), callback = std::move(callback)]() mutable {
-        self->_updateState(nullptr, SessionEvent::ExternalFlush, std::move(callback));
+    _sessionQueue->async([self = shared_from_this(), event, callback = std::move(callback)]() mutable {
+        self->_updateState(nullptr, event, std::move(callback));
     });
 }
 

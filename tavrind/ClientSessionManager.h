@@ -63,8 +63,14 @@ public:
     virtual void addTavrinFeedback(std::shared_ptr<TavrinFeedback> feedback);
     /// The current session; null for none. Waits for the queue.
     [[nodiscard]] std::shared_ptr<Session> session();
+    /// Moves the session on, soon, by an event that needs no feedback: those of memory pressure have no source here,
+    /// and a number that is none is logged and ignored. An external flush calls back once it is done.
+    void externalEvent(SessionEvent event, std::move_only_function<void()> callback = {});
     /// Ends the session, soon, then calls back.
-    void flushSession(std::move_only_function<void()> callback);
+    void flushSession(std::move_only_function<void()> callback)
+    {
+        externalEvent(SessionEvent::ExternalFlush, std::move(callback));
+    }
     /// A connection has gone. With a shared session that is an event like others, and the callback gets false; else the
     /// session is flushed, then it gets true.
     void flushSessionInvalidation(const std::string& userAgent, std::move_only_function<void(bool flushed)> callback);

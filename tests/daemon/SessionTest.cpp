@@ -96,6 +96,15 @@ TEST_F(SessionTest, SessionsEndAtTheirLimits)
              report("ZRClearInputFeedback");
          },
          "guid changed", events({})},
+        {"another GUID counts before an engagement behind 10 minutes",
+         [this] {
+             device.advance(601s);
+             assembly().guidController->reset();
+             device.drain();
+             report("ZRResultEngagementFeedback");
+             EXPECT_EQ(state(), SessionState::Open);
+         },
+         "guid changed", events({})},
     };
     std::string previous = "no previous session";
     for (const Case& each : cases) {
@@ -184,6 +193,29 @@ TEST_F(SessionTest, OneSessionForEachUserAgentOfASharedOne)
     EXPECT_EQ(all[0]["user_guid"], all[1]["user_guid"]);
     EXPECT_EQ(typesIn(all[1]), (Types{"clear_input", "session_end"}));
     EXPECT_EQ(counter("Vistrel/4.sessions"), 1);
+}
+
+TEST_F(SessionTest, EventsFromOutsideByNumber)
+{
+    begin();
+    platform::test::LogCapture log;
+    const auto post = [this](unsigned number) {
+        manager()->externalEvent(static_cast<SessionEvent>(number));
+        device.drain();
+    };
+    appear();
+    flushSession();
+    appear();
+    for (const unsigned unused : {4u, 11u}) post(unused);
+    EXPECT_EQ(log.count("External event received 4") + log.count("External event received 11"), 2);
+    EXPECT_EQ(sessionFiles().size(), 2u);
+    post(5); // a warning
+    EXPECT_EQ(sessionFiles().size(), 1u) << "the closed one is uploaded";
+    EXPECT_EQ(state(), SessionState::Open);
+    post(6); // critical
+    EXPECT_EQ(state(), SessionState::None);
+    ASSERT_EQ(uploads().size(), 2u);
+    EXPECT_EQ(reason(decoded(*uploads()[1])), "critical memory");
 }
 
 TEST_F(SessionTest, EndOfAConnection)
@@ -319,6 +351,27 @@ TEST_F(SessionTest, FeedbackInMemoryIsAnsweredWithTimesSinceTheFirst)
     EXPECT_EQ(events[1]["timestamp"], Value(1000));
     EXPECT_EQ(events[2]["timestamp"], Value(1001)) << "whole milliseconds, cut";
     EXPECT_EQ(events[2]["query_id"], Value(8));
+}
+
+TEST_F(SessionTest, SharedFeedbackInMemoryIsOneAgentsBehindAnothers)
+{
+    begin();
+    assembly().testFeedbacks = true;
+    const auto first = connection;
+    const auto second = client("com.quorvane.wendral", "Wendral/7", 78);
+    for (const auto& [from, timestamp] : {std::pair(second, 5'000'000), {first, 6'000'000}, {second, 8'000'000}}) {
+        connection = from;
+        report("ZRClearInputFeedback", {{"timestamp", timestamp}});
+    }
+    const auto call = first->call("Feedback", {""});
+    device.drain();
+    const Value events = call->argument(0);
+    Value::Array times;
+    for (std::size_t i = 0; i < events.count(); ++i) times.push_back(events[i]["timestamp"]);
+    EXPECT_EQ(times, (Value::Array{0, 0, 3})) << "Vistrel's, then Wendral's, each since its own first";
+    std::vector<std::string> agents;
+    for (const auto& feedback : manager()->session()->getSessionFeedbacks()) agents.push_back(feedback->userAgent);
+    EXPECT_EQ(agents, (std::vector<std::string>{"Vistrel/4", "Wendral/7", "Wendral/7"}));
 }
 
 } // namespace
