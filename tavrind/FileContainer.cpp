@@ -40,12 +40,22 @@ const platform::RecordClasses& fileRecordClasses()
     return classes;
 }
 
-/// The next record as a `T`; null if it is none, or broken.
-template <class T> std::shared_ptr<T> readNext(ArchivedDataIterator& records)
+std::string archived(const std::string& text)
+{
+    return platform::archiveValue(text);
+}
+
+std::string archived(const platform::Record& record)
+{
+    return platform::archive(record);
+}
+
+/// The next record; null if it can't be read.
+std::shared_ptr<platform::Record> readNext(ArchivedDataIterator& records)
 {
     const auto archive = records.readNextObject();
     if (!archive) return nullptr;
-    auto record = platform::castRecord<T>(platform::unarchive(*archive, fileRecordClasses()));
+    auto record = platform::unarchive(*archive, fileRecordClasses());
     if (!record) log().error("{}", record.error().reason());
     return record.value_or(nullptr);
 }
@@ -67,11 +77,11 @@ FileContainer::~FileContainer() = default;
 void FileContainer::writeSessionHeader(ClientSessionHeader header)
 {
     _store->queue->async([self = shared_from_this(), header = std::move(header)] {
-        if (!self->_archiveObject(platform::archiveValue(self->_store->version))) {
+        if (!self->_archiveObject(self->_store->version)) {
             log().error("Could not write version string");
             self->closeFile();
         }
-        if (!self->_archiveObject(platform::archive(header))) {
+        if (!self->_archiveObject(header)) {
             log().error("Could not write root object");
             self->closeFile();
         }
@@ -83,7 +93,7 @@ void FileContainer::writeFeedback(std::shared_ptr<const TavrinFeedback> feedback
     _store->queue->async([self = shared_from_this(), feedback = std::move(feedback), done = std::move(done)]() mutable {
         FeedbackBooks& books = self->_store->books;
         if (!self->_fileHandle) return books.move(FeedbackFate::Open, FeedbackFate::NoContainer, 1);
-        if (self->_archiveObject(platform::archive(*feedback)))
+        if (self->_archiveObject(*feedback))
             ++self->_feedbackCount;
         else
             books.move(FeedbackFate::Open, FeedbackFate::RefusedAppend, 1);
@@ -91,11 +101,16 @@ void FileContainer::writeFeedback(std::shared_ptr<const TavrinFeedback> feedback
     });
 }
 
-bool FileContainer::_archiveObject(const std::string& archive)
+template <class Object> bool FileContainer::_archiveObject(const Object& object)
 {
     _store->queue->assertOnQueue();
     if (!_fileHandle) return false;
     const auto transaction = _store->transactions.begin("archiveObject");
+    return _append(archived(object));
+}
+
+bool FileContainer::_append(const std::string& archive)
+{
     const std::uint64_t end = _fileHandle->size();
     const std::uint64_t length = archive.size();
     if (end + sizeof(length) + length >= _store->maxFileSize) {
@@ -177,15 +192,16 @@ std::shared_ptr<StoredSession> FileContainer::_unarchiveObject(const Bytes& data
     if (!version || !version->asString()) return _notRead(FeedbackFate::Unreadable, "version string not stored");
     if (*version->asString() != _store->version)
         return _notRead(FeedbackFate::OtherVersion, "version not supported: " + *version->asString());
-    const auto header = readNext<ClientSessionHeader>(records);
+    const auto header = std::dynamic_pointer_cast<ClientSessionHeader>(readNext(records));
     if (!header) return _notRead(FeedbackFate::Unreadable, "client session not stored");
 
     std::vector<std::shared_ptr<TavrinFeedback>> feedbacks;
     while (records.hasMore()) {
         const std::uint64_t position = records.position();
-        auto feedback = readNext<TavrinFeedback>(records);
+        const auto record = readNext(records);
+        if (!record) log().error("could not unarchive feedback range {} size {}", position, records.size());
+        auto feedback = std::dynamic_pointer_cast<TavrinFeedback>(record);
         if (!feedback) {
-            log().error("could not unarchive feedback range {} size {}", position, records.size());
             log().error("tavrin feedback expected");
             break;
         }

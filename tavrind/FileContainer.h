@@ -73,7 +73,9 @@ public:
                                                      const std::filesystem::path& fileUrl);
 
 private:
-    bool _archiveObject(const std::string& archive);
+    /// Appends a text or a record. On the queue; false if it was not written.
+    template <class Object> bool _archiveObject(const Object& object);
+    bool _append(const std::string& archive);
     [[nodiscard]] std::shared_ptr<StoredSession> _read();
     [[nodiscard]] std::shared_ptr<StoredSession> _unarchiveObject(const platform::Bytes& data);
     /// Logs why nothing was read, and books the file's events.

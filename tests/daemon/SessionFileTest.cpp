@@ -4,7 +4,9 @@
 #include "platform/Record.h"
 #include "tavrind/ArchivedDataIterator.h"
 #include "tavrind/ClientSessionHeader.h"
+#include "tavrind/OutputStream.h"
 #include "tavrind/StoredSession.h"
+#include "tavrind/TavrinFeedbackFlusher.h"
 #include "tests/support/Examples.h"
 #include "tests/support/FeedbackFixture.h"
 
@@ -232,6 +234,78 @@ TEST_F(SessionFileTest, WhatIsNoSessionFileIsNotRead)
                     ->read());
     EXPECT_EQ(log.count("out of range"), 1);
     EXPECT_EQ(log.count("tavrin feedback expected"), 1);
+    EXPECT_EQ(log.count("could not unarchive feedback range"), 1);
+    // What can be read and is no event ends the file, too, as does what can't be read.
+    for (const auto& [next, unreadable] : {std::pair(platform::archive(header()), 0), {std::string("\xc1"), 1}}) {
+        LogCapture lines;
+        const auto session = adopted(framed({version, platform::archive(header()), platform::archive(*feedback("x")),
+                                             next, platform::archive(*feedback("y"))}))
+                                 ->read();
+        EXPECT_EQ(inputsIn(*session), std::vector<std::string>{"x"});
+        EXPECT_EQ(lines.count("tavrin feedback expected"), 1);
+        EXPECT_EQ(lines.count("could not unarchive feedback range"), unreadable);
+    }
+}
+
+/// Notes the open transactions while it is encoded.
+struct Watcher : platform::RecordOf<Watcher, ZRFeedback> {
+    static constexpr std::string_view kClass = "Watcher";
+    const platform::Transactions* transactions = nullptr;
+    mutable std::map<std::string, int> seen;
+    static constexpr auto fields() { return std::tuple<>{}; }
+    void encodeFields(platform::Encoder& encoder) const override
+    {
+        seen = transactions->open();
+        RecordOf::encodeFields(encoder);
+    }
+};
+
+TEST_F(SessionFileTest, TheProcessIsWantedWhileItEncodes)
+{
+    start();
+    const auto watcher = std::make_shared<Watcher>();
+    watcher->transactions = &device.transactions;
+    const auto container = storage()->createFileContainerForWriting();
+    container->writeFeedback(std::make_shared<TavrinFeedback>(watcher, 1, kGuid, "A/1"), {});
+    device.drain();
+    EXPECT_TRUE(watcher->seen.contains("archiveObject"));
+    EXPECT_FALSE(device.transactions.open().contains("archiveObject"));
+}
+
+TEST_F(SessionFileTest, EveryReadGivesTheSameUpload)
+{
+    start();
+    const auto chosen = std::make_shared<ZRSuggestionEngagementFeedback>();
+    chosen->suggestion = std::make_shared<ZRSearchSuggestion>();
+    chosen->suggestion->identifier = "private";
+    const auto uploadOf = [](FileContainer& container) {
+        FeedbacksToSend upload = container.read()->getFeedbacksToSend();
+        MemoryOutputStream stream;
+        stream.open();
+        EXPECT_TRUE(writeJson(upload, stream));
+        return stream.contents();
+    };
+    ClientSessionHeader some = header();
+    ClientSessionHeader none = header();
+    none.resourceVersions = nullptr;
+    for (const auto& [head, rest] :
+         {std::pair(some, R"(,"resource_versions":{"TAVCorrectionDict":"3"},"first_use":true,"base_time":1767225600,)"
+                          R"("previous_session_end_reason":"no previous session"})"),
+          {none, "}"}}) { // what is missing ends the list
+        const auto container = storage()->createFileContainerForWriting();
+        container->writeSessionHeader(head);
+        container->writeFeedback(std::make_shared<TavrinFeedback>(chosen, 1, kGuid, "Vistrel/4"), {});
+        storage()->closeSessionWithFileContainer(container);
+        device.drain();
+        for (int i = 0; i < 2; ++i)
+            EXPECT_EQ(
+                uploadOf(*container),
+                std::string(R"({"fb":[{"id":"1","query_id":1,"type":"suggestion_engagement","timestamp":0},)"
+                            R"({"suggestions":[{"id":"1","suggestion":null,"score":0,"suggestion_type":"unknown"}],)"
+                            R"("type":"session_missing_suggestions","timestamp":0}],)"
+                            R"("agent":"Vistrel/4","user_guid":"01234567-89AB-4DEF-8123-456789ABCDEF")") +
+                    rest);
+    }
 }
 
 // The directory
