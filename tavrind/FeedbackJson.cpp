@@ -188,14 +188,15 @@ void add(Dictionary& event, const ZRStartSearchFeedback& record)
 
 void add(Dictionary& event, const ZRRankingFeedback& record)
 {
-    event.set("blending_duration", record.blendingDuration);
-    event.set("sections", objects(record.sections));
-    if (const auto* ranker = dynamic_cast<const TAVRankerFeedback*>(&record)) {
+    if (const auto* ranker = dynamic_cast<const TAVRankerFeedback*>(&record)) { // of its run alone, not of the ranking
         event.set("ranker_did_rank", true);
         event.set("ranker_timeout", ranker->timedOut);
         event.set("ranker_results", ranker->resultCount);
         event.set("ranker_duration", ranker->duration);
+        return;
     }
+    event.set("blending_duration", record.blendingDuration);
+    event.set("sections", objects(record.sections));
 }
 
 bool isOfSearchEngine(ResultType type)

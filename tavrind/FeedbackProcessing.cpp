@@ -1,5 +1,6 @@
 #include "tavrind/FeedbackProcessing.h"
 
+#include "CoreTavrin/TAVFeedback.h"
 #include "searchrecords/ZRResultFeedback.h"
 #include "tavrind/FeedbackTypes.h"
 #include "tavrind/SessionProcessingHelper.h"
@@ -81,7 +82,9 @@ void process(ZRFeedback& record, SessionProcessingHelper& helper)
     switch (eventType(record)) {
     case EventType::VisibleResults: // whole results come with the ranking
         return processor.referToAll(as<ZRVisibleResultsFeedback>(record).results);
-    case EventType::RankSections: return processor.showAll(as<ZRRankingFeedback>(record).sections);
+    case EventType::RankSections:
+        if (record.className() == TAVRankerFeedback::kClass) return; // its event has no sections
+        return processor.showAll(as<ZRRankingFeedback>(record).sections);
     case EventType::ResultsReceivedAfterTimeout:
         return processor.showAll(as<ZRResultsReceivedAfterTimeoutFeedback>(record).results);
     case EventType::LateSectionsAppended:

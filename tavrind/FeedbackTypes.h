@@ -3,6 +3,7 @@
 #include <cstdint>
 #include <span>
 #include <string_view>
+#include <unordered_set>
 
 namespace tavrin {
 
@@ -48,6 +49,10 @@ enum class EventType : std::int64_t {
 /// The names of the event types, by value.
 [[nodiscard]] std::span<const std::string_view> eventTypes();
 [[nodiscard]] std::string_view eventTypeToString(EventType type);
+
+/// The keys that the daemon makes events of, and the objects in them. A client's own JSON, headers, features and timing
+/// data have others.
+[[nodiscard]] const std::unordered_set<std::string_view>& sharedKeySet();
 
 /// The event that a record reports: that of its class, which is listed for every class. A custom record's follows from
 /// its feedback type.

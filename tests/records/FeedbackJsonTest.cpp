@@ -12,6 +12,22 @@ namespace {
 
 using platform::Value;
 
+/// Counts the keys in an event and the objects in it, which must be of the shared set.
+int knownKeysIn(const Value& value)
+{
+    int keys = 0;
+    if (const auto* elements = value.asArray())
+        for (const Value& element : *elements) keys += knownKeysIn(element);
+    if (const auto* object = value.asDictionary()) {
+        for (const auto& [key, entry] : *object) {
+            EXPECT_TRUE(sharedKeySet().contains(key)) << key;
+            const bool isForeign = key == "headers" || key == "local_features" || key == "network_timing_data";
+            keys += 1 + (isForeign ? 0 : knownKeysIn(entry));
+        }
+    }
+    return keys;
+}
+
 TEST(FeedbackJson, EventsAreAsThePageShowsThem)
 {
     static const std::regex kExample("```json\n([^`]*)\n```\n```json\n([^`]*)\n```|\n### (\\w+)");
@@ -19,6 +35,7 @@ TEST(FeedbackJson, EventsAreAsThePageShowsThem)
     std::set<std::string> shown;
     std::set<std::string> classes;
     std::string type;
+    int keys = 0;
     for (std::sregex_iterator match(page.begin(), page.end(), kExample), end; match != end; ++match) {
         if ((*match)[3].matched) {
             type = (*match)[3];
@@ -28,10 +45,13 @@ TEST(FeedbackJson, EventsAreAsThePageShowsThem)
         const Value event = parsed((*match)[2].str());
         EXPECT_EQ(eventFor(record), platform::toJson(event)) << record;
         EXPECT_EQ(event["type"], Value(type));
+        keys += type.starts_with("custom_") ? 0 : knownKeysIn(event);
         shown.insert(type);
         classes.insert(*parsed(record)["class"].asString());
     }
     EXPECT_EQ(shown.size(), eventTypes().size() - 1) << "all but visible_card";
+    EXPECT_EQ(sharedKeySet().size(), 99u);
+    EXPECT_GT(keys, 200);
     for (const auto& [name, make] : tavrindRecordClasses()) {
         const auto record = std::dynamic_pointer_cast<ZRFeedback>(make());
         const bool isPart = name == "ZRResultRankingFeedback" || name == "ZRSectionRankingFeedback";

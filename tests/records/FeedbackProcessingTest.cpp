@@ -53,9 +53,12 @@ constexpr const char* kSectionA =
 constexpr const char* kSuggestedA = R"({"class":"ZRVisibleSuggestionsFeedback","suggestions":[<s:a>]})";
 constexpr const char* kChosenA = R"({"class":"ZRSuggestionEngagementFeedback","suggestion":<s:a>})";
 constexpr const char* kRanked =
-    R"({"class":"TAVRankerFeedback","sections":[{"class":"ZRSectionRankingFeedback",
+    R"({"class":"ZRRankingFeedback","sections":[{"class":"ZRSectionRankingFeedback",
         "section":{"class":"ZRResultSection","results":[<r:b>]},"results":[{"class":"ZRResultRankingFeedback",
         "result":<r:a>,"hiddenResults":[<r:c>],"duplicateResults":[<r:d>]}]}]})";
+constexpr const char* kRanker =
+    R"({"class":"TAVRankerFeedback","sections":[{"class":"ZRSectionRankingFeedback",
+        "results":[{"class":"ZRResultRankingFeedback","hiddenResults":[<r:a>]}]}]})";
 
 TEST(SessionProcessing, IdentifiersBecomeNumbersAndWhatNoEventShowedIsMissing)
 {
@@ -72,6 +75,7 @@ TEST(SessionProcessing, IdentifiersBecomeNumbersAndWhatNoEventShowedIsMissing)
         {"shown, then engaged", {kLateA, kEngagedA}, "1 1 ", "", ""},
         {"shown in a section, whose identifier stays", {kEngagedA, kSectionA}, "1 kept 1 ", "", ""},
         {"a ranking shows its section, hidden, duplicate, ranked", {kRanked, kVisible}, "2 3 4 1 4 ", "", ""},
+        {"a ranker's record shows nothing", {kEngagedA, kRanker}, "1 ", "1 ", ""},
         {"a suggestion chosen, never shown", {kChosenA}, "1 ", "", "1 "},
         {"a suggestion chosen, then shown", {kChosenA, kSuggestedA}, "1 1 ", "", ""},
         {"a suggestion shown, then chosen", {kSuggestedA, kChosenA}, "1 1 ", "", ""},
