@@ -28,6 +28,13 @@ std::size_t utf16Length(std::string_view text)
     return units;
 }
 
+std::string_view cut(std::string_view text, std::size_t size)
+{
+    if (text.size() <= size) return text;
+    while (size > 0 && (static_cast<unsigned char>(text[size]) & 0xc0) == 0x80) --size;
+    return text.substr(0, size);
+}
+
 std::string lowerCased(std::string_view text)
 {
     std::string result;

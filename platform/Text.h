@@ -11,6 +11,9 @@ namespace platform {
 /// The length of a UTF-8 text in UTF-16 units. A byte that is no part of valid UTF-8 counts as one.
 [[nodiscard]] std::size_t utf16Length(std::string_view text);
 
+/// The first `size` bytes of a text, less where they would end within a character (UTF-8).
+[[nodiscard]] std::string_view cut(std::string_view text, std::size_t size);
+
 /// A text in lower case, by Unicode's rules without those of any one language.
 [[nodiscard]] std::string lowerCased(std::string_view text);
 

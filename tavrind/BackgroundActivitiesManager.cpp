@@ -41,6 +41,14 @@ platform::ActivityCriteria criteria()
     return criteria;
 }
 
+/// Moves the activity on, or logs that it may not.
+void setState(ActivityState state, platform::Activity& activity)
+{
+    const ActivityState current = TavrinXPCActivity::getStateForActivity(activity);
+    if (!TavrinXPCActivity::setState(state, activity))
+        log().fault("State transition from {} to {} invalid", static_cast<int>(current), static_cast<int>(state));
+}
+
 } // namespace
 
 std::shared_ptr<BackgroundActivitiesManager> BackgroundActivitiesManager::make(Assembly& assembly)
@@ -70,18 +78,19 @@ BackgroundActivitiesManager::~BackgroundActivitiesManager()
 
 void BackgroundActivitiesManager::_runActivity(const std::shared_ptr<platform::Activity>& activity)
 {
-    if (activity->state() != ActivityState::Run) return; // it checks in with the criteria that it was registered with
+    if (TavrinXPCActivity::getStateForActivity(*activity) != ActivityState::Run)
+        return; // it checks in with the criteria that it was registered with
     if (_stopFlushing) {
         log().log("flushing has been stopped, will start again with dump command");
-        TavrinXPCActivity::setState(ActivityState::Done, *activity);
+        setState(ActivityState::Done, *activity);
         return;
     }
     log().log("scheduled flush feedbacks to wire {}", kActivity);
-    TavrinXPCActivity::setState(ActivityState::Continue, *activity);
+    setState(ActivityState::Continue, *activity);
     auto transaction = _assembly.device.transactions.begin(kActivity);
     _queueFlusher->async([self = shared_from_this(), activity, transaction = std::move(transaction)] {
         self->_flusherActivity();
-        TavrinXPCActivity::setState(ActivityState::Done, *activity);
+        setState(ActivityState::Done, *activity);
     });
 }
 

@@ -83,9 +83,11 @@ std::ptrdiff_t CompressedOutputStream::write(std::string_view bytes)
 
 void CompressedOutputStream::close()
 {
-    if (_status == StreamStatus::Open && _deflate({}, Z_FINISH)) _status = StreamStatus::Closed;
+    if (_status == StreamStatus::Open) _deflate({}, Z_FINISH);
+    if (_status != StreamStatus::Error) _status = StreamStatus::Closed;
     if (_sha512Context) EVP_DigestFinal_ex(_sha512Context.get(), _digest.data(), nullptr);
     _sha512Context.reset();
+    _stream.reset();
     _outputStream->close();
 }
 

@@ -22,7 +22,8 @@ public:
     /// Opens the other stream, too.
     void open() override;
     std::ptrdiff_t write(std::string_view bytes) override;
-    /// Writes what the compressor still holds, and closes the other stream.
+    /// Writes what the compressor still holds, lets go of it, and closes the other stream. A stream that was closed, be
+    /// it before it was opened, can't be opened again.
     void close() override;
     [[nodiscard]] StreamStatus streamStatus() const override { return _status; }
     [[nodiscard]] std::optional<platform::Error> streamError() const override { return _error; }

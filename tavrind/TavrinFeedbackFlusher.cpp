@@ -7,6 +7,7 @@
 #include "platform/Device.h"
 #include "platform/Files.h"
 #include "platform/Queue.h"
+#include "platform/Text.h"
 #include "platform/Uuid.h"
 #include "searchrecords/ZRViewFeedback.h"
 #include "tavrind/Assembly.h"
@@ -27,6 +28,7 @@ namespace {
 constexpr platform::Duration kUploadTimeout = 300s;
 constexpr std::size_t kMaximumPath = 1024;
 constexpr int kMaximumNameAttempts = 16;
+constexpr std::size_t kLongestLoggedObject = 200; // bytes
 
 // Records that go out on their own wait in memory for the next pass, ten minutes or longer.
 constexpr std::size_t kMaximumRecords = 1000;
@@ -217,13 +219,12 @@ void TavrinFeedbackFlusher::_flushObject(Flushable& object, Bodies* bodies)
     const std::size_t count = feedbacks.count();
     const bool written = writeJson(feedbacks, stream);
     stream.close();
-    if (!written || stream.streamError()) {
-        const auto error = stream.streamError();
-        log().error("Invalid JSON Object {} error {}", error ? "" : platform::toJson(feedbacks.rest).substr(0, 200),
+    const auto error = stream.streamError();
+    if (!written || error) { // what there is of the file stays, for whoever looks into it
+        const std::string text = platform::toJson(feedbacks.rest);
+        log().error("Invalid JSON Object {} error {}", platform::cut(text, kLongestLoggedObject),
                     error ? error->description() : "not a dictionary");
-        if (!error) return drop(FeedbackFate::NotJson);
-        (void)_assembly.fileManager.remove(fpath); // a full disk needs the room
-        return drop(FeedbackFate::NoBody);
+        return drop(error ? FeedbackFate::NoBody : FeedbackFate::NotJson);
     }
 
     const std::string digest = stream.dataDigestForStream();

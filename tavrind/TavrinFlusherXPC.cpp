@@ -107,6 +107,8 @@ void TavrinFlusherXPC::_removeDelegate(const Tool& tool)
 
 void TavrinFlusherXPC::initiateConnectionWithIntent(std::uint64_t intent, std::shared_ptr<TAVFlusherListener> tool)
 {
+    constexpr std::uint64_t kLastIntent = 3;
+    if (intent > kLastIntent) return log().log("Unsupported command yet: {}", intent);
     std::unique_lock lock(_mutex);
     _remoteObject = tool;
     switch (intent) {
@@ -129,7 +131,6 @@ void TavrinFlusherXPC::initiateConnectionWithIntent(std::uint64_t intent, std::s
         }
         lock.unlock();
         return _dump(tool);
-    default: log().log("Unsupported command yet: {}", intent);
     }
 }
 

@@ -2,7 +2,6 @@
 
 #include "platform/Device.h"
 #include "tavrind/Assembly.h"
-#include "tavrind/TavrinLogging.h"
 
 namespace tavrin {
 
@@ -19,11 +18,17 @@ void TavrinXPCActivity::unregister(Assembly& assembly, const std::string& identi
 
 bool TavrinXPCActivity::setState(platform::ActivityState state, platform::Activity& activity)
 {
-    const platform::ActivityState current = activity.state();
-    if (activity.setState(state)) return true;
-    TavrinLogForCategory(kLogFlusher)
-        .fault("State transition from {} to {} invalid", static_cast<int>(current), static_cast<int>(state));
-    return false;
+    return activity.setState(state);
+}
+
+platform::ActivityState TavrinXPCActivity::getStateForActivity(const platform::Activity& activity)
+{
+    return activity.state();
+}
+
+bool TavrinXPCActivity::shouldDefer(const platform::Activity& activity)
+{
+    return activity.shouldDefer();
 }
 
 } // namespace tavrin

@@ -32,8 +32,11 @@ struct TavrinXPCActivity {
     static void registerActivity(Assembly& assembly, const std::string& identifier,
                                  platform::ActivityCriteria criteria, Handler handler);
     static void unregister(Assembly& assembly, const std::string& identifier);
-    /// Whether the activity moved on; a refusal is logged as a fault.
-    static bool setState(platform::ActivityState state, platform::Activity& activity);
+    /// Whether the activity moved on.
+    [[nodiscard]] static bool setState(platform::ActivityState state, platform::Activity& activity);
+    [[nodiscard]] static platform::ActivityState getStateForActivity(const platform::Activity& activity);
+    /// Whether a run under way should stop and wait for a better moment.
+    [[nodiscard]] static bool shouldDefer(const platform::Activity& activity);
 };
 
 } // namespace tavrin

@@ -37,6 +37,8 @@ struct UploadTest : FeedbackTest {
         upload();
         return uploads().back();
     }
+    /// What was not made into an upload.
+    std::size_t temporaryFiles() { return device.files.list("/tmp").value_or(std::vector<std::string>()).size(); }
 };
 
 TEST_F(UploadTest, WhatTheServiceGets)
@@ -62,7 +64,7 @@ TEST_F(UploadTest, WhatTheServiceGets)
                            "previous_session_end_reason"}));
     EXPECT_EQ(session["base_time"], Value(1767225600));
     EXPECT_TRUE(sessionFiles().empty());
-    EXPECT_TRUE(device.files.list("/tmp").value_or(std::vector<std::string>()).empty()) << "nothing is left behind";
+    EXPECT_EQ(temporaryFiles(), 0u) << "nothing is left behind";
 }
 
 TEST_F(UploadTest, EndsAreCounted)
@@ -96,8 +98,15 @@ TEST_F(UploadTest, CrowdsourcingRecordsGoOutOnTheirOwn)
     begin();
     report("ZRCustomFeedback", {{"feedbackType", 2}, {"jsonFeedback", Dictionary{{"tld", "ch"}}}});
     report("ZRCustomFeedback", {{"feedbackType", 2}}); // no JSON
-    EXPECT_EQ(counter("dp.submit"), 2);
+    std::string text = "a";
+    for (int i = 0; i < 200; ++i) text += "é";
+    report("ZRCustomFeedback", {{"feedbackType", 2}, {"jsonFeedback", Value::Array{text}}});
+    EXPECT_EQ(counter("dp.submit"), 3);
+    LogCapture log;
     upload();
+    EXPECT_EQ(log.count("Invalid JSON Object null error "), 1);
+    EXPECT_EQ(log.count("Invalid JSON Object [\"" + text.substr(0, 197) + " error "), 1) << "cut between characters";
+    EXPECT_EQ(temporaryFiles(), 2u) << "what could not be written stays";
     ASSERT_EQ(uploads().size(), 1u);
     EXPECT_EQ(assembly().crowdsourcingFeedbackFlusher->serverEndpoint()->string(), "https://f.example/crowd?y=2")
         << "as the bag has it";
@@ -107,7 +116,30 @@ TEST_F(UploadTest, CrowdsourcingRecordsGoOutOnTheirOwn)
     device.drain();
     EXPECT_EQ(counter("feedbacksent"), 0) << "only sessions are counted";
     EXPECT_EQ(booked(FeedbackFate::Sent), 1);
-    EXPECT_EQ(booked(FeedbackFate::NotJson), 1);
+    EXPECT_EQ(booked(FeedbackFate::NotJson), 2);
+    expectBooksClose();
+    EXPECT_TRUE(assembly().crowdsourcingFeedbackFlusher->flushToWireSync().empty());
+    EXPECT_EQ(log.count("Sessions Flushed 0"), 1);
+}
+
+TEST_F(UploadTest, AnUploadOfAnEarlierProcessIsCountedAtItsEnd)
+{
+    begin();
+    report("ZRCustomFeedback", {{"feedbackType", 2}, {"jsonFeedback", Dictionary()}});
+    uploadOne();
+    uploadOne();
+    const auto earlier = uploads();
+    ASSERT_EQ(earlier.size(), 3u);
+    restart();
+    const std::int64_t sent = counter("feedbacksent");
+    for (const auto& task : earlier)
+        device.background.sessions.at("com.quorvane.tavrind.flusher.nsurlsession")->adopt(*task);
+    earlier[0]->respond(200);
+    earlier[1]->respond(200);
+    earlier[2]->respond(503);
+    device.drain();
+    EXPECT_EQ(counter("feedbacksent") - sent, 7) << "not what the other flusher sent";
+    EXPECT_EQ(counter("feedbacknotsent"), 7);
     expectBooksClose();
 }
 
@@ -232,6 +264,7 @@ TEST_F(UploadTest, StatesOfTheActivity)
     device.drain();
     EXPECT_TRUE(log.has(platform::LogLevel::Fault, "Tavrin_Flusher", "State transition from 2 to 4 invalid"));
     EXPECT_TRUE(log.has(platform::LogLevel::Fault, "Tavrin_Flusher", "State transition from 2 to 5 invalid"));
+    EXPECT_EQ(log.count("State transition"), 2);
     EXPECT_TRUE(sessionFiles().empty()) << "the pass ran all the same";
 }
 
@@ -263,6 +296,7 @@ TEST_F(UploadTest, FaultsOfTheDiskLoseOneSessionAndNothingElse)
         EXPECT_EQ(typesIn(decoded(*uploadOne())), (Types{"search_view_appear", "session_end"})) << each.operation;
         expectBooksClose();
     }
+    EXPECT_EQ(temporaryFiles(), 1u) << "of the body that could not be written";
 }
 
 TEST_F(UploadTest, AThousandClientsComeAndGo)
@@ -412,6 +446,21 @@ TEST_F(BridgeTest, DumpEndsSessionsAndShowsTheBodies)
     EXPECT_EQ(signals(*dumper), Types{"WorkDone"}) << "nothing left";
 }
 
+TEST_F(BridgeTest, AnUnknownCommandChangesNothing)
+{
+    begin();
+    const auto earlier = tool();
+    const auto last = tool();
+    intent(*earlier, 7);
+    LogCapture log;
+    earlier->end();
+    device.drain();
+    EXPECT_EQ(log.count("Removed remote listener"), 0) << "that is the last one to connect";
+    last->end();
+    device.drain();
+    EXPECT_EQ(log.count("Removed remote listener"), 1);
+}
+
 TEST_F(BridgeTest, EachToolGetsWhatItAskedFor)
 {
     begin();
@@ -445,7 +494,20 @@ TEST(CompressedOutputStreamTest, RoundTripAndDigest)
         const auto& packed = static_cast<const MemoryOutputStream&>(stream.outputStream()).contents();
         EXPECT_EQ(tools::inflateRaw(packed, 1u << 20).value(), text);
         EXPECT_EQ(stream.dataDigestForStream(), sha512(text));
+        EXPECT_EQ(stream.write("x"), -1) << "closed";
     }
+}
+
+TEST(CompressedOutputStreamTest, ClosedBeforeItWasOpenedItStaysClosed)
+{
+    CompressedOutputStream stream;
+    stream.close();
+    stream.open();
+    EXPECT_EQ(stream.write("x"), -1);
+    stream.close();
+    EXPECT_EQ(stream.streamStatus(), StreamStatus::Closed);
+    EXPECT_EQ(stream.dataDigestForStream(), sha512(""));
+    EXPECT_EQ(static_cast<const MemoryOutputStream&>(stream.outputStream()).contents(), "");
 }
 
 } // namespace

@@ -17,6 +17,13 @@ TEST(Text, TrimsWhiteSpaceOfUnicode)
         EXPECT_EQ(trimmed(text), trimmedText);
 }
 
+TEST(Text, IsCutBetweenCharacters)
+{
+    for (const auto& [size, start] :
+         {std::pair(0u, ""), {1u, "a"}, {2u, "a"}, {3u, "aé"}, {6u, "aé"}, {7u, "aé😀"}, {9u, "aé😀"}})
+        EXPECT_EQ(cut("aé😀", size), start) << size;
+}
+
 TEST(Text, DividesIntoWordsAsTheLocaleDoes)
 {
     using Words = std::vector<std::string>;

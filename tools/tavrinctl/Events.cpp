@@ -7,6 +7,7 @@
 #include <fmt/ranges.h>
 
 #include "platform/Error.h"
+#include "platform/Text.h"
 #include "tools/shared/Inflate.h"
 #include "tools/tavrinctl/Tool.h"
 
@@ -23,10 +24,8 @@ constexpr std::size_t kMostTypes = 24;   // runs of one type
 /// The text, cut to so many bytes between two characters.
 std::string shortened(const std::string& text)
 {
-    if (text.size() <= kLongestText) return printable(text);
-    std::size_t end = kLongestText;
-    while (end > 0 && (static_cast<unsigned char>(text[end]) & 0xc0) == 0x80) --end;
-    return printable(text.substr(0, end)) + "…";
+    const std::string_view start = platform::cut(text, kLongestText);
+    return printable(std::string(start)) + (start.size() < text.size() ? "…" : "");
 }
 
 std::string textOr(const Value& value, std::string_view fallback)
