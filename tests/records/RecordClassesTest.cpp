@@ -226,8 +226,10 @@ TEST(RecordClasses, AnEventSurvivesARecordThatIsNoneOfAnEvent)
     }
     // A broken record of an event is damage.
     const Value broken = Dictionary{{"class", "ZRClearInputFeedback"}, {"triggerEvent", "x"}};
-    for (const auto& decoded : decodedBothWays(Dictionary{{"class", "TavrinFeedback"}, {"feedback", broken}}))
+    for (const auto& decoded : decodedBothWays(Dictionary{{"class", "TavrinFeedback"}, {"feedback", broken}})) {
+        ASSERT_FALSE(decoded);
         EXPECT_THAT(decoded.error().reason(), StartsWith("feedback.triggerEvent: "));
+    }
 }
 
 TEST(RecordClasses, FieldsKeepWhatSubclassesAdd)
