@@ -25,7 +25,7 @@ constexpr std::size_t kMostTypes = 24;   // runs of one type
 std::string shortened(const std::string& text)
 {
     const std::string_view start = platform::cut(text, kLongestText);
-    return printable(std::string(start)) + (start.size() < text.size() ? "…" : "");
+    return printable(start) + (start.size() < text.size() ? "…" : "");
 }
 
 std::string textOr(const Value& value, std::string_view fallback)
