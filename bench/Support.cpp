@@ -165,6 +165,35 @@ std::string Process::firstLine()
     die("a process ended early");
 }
 
+Echo::Echo(std::size_t call, std::size_t reply) : _call(call), _reply(reply), _message(std::max(call, reply), 'x')
+{
+    int sockets[2];
+    require(socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, sockets) == 0, "socketpair");
+    _pid = fork();
+    require(_pid >= 0, "fork");
+    if (_pid == 0) {
+        close(sockets[0]);
+        while (recv(sockets[1], _message.data(), call, MSG_WAITALL) == static_cast<ssize_t>(call))
+            if (write(sockets[1], _message.data(), reply) != static_cast<ssize_t>(reply)) break;
+        _exit(0);
+    }
+    close(sockets[1]);
+    _socket = sockets[0];
+}
+
+Echo::~Echo()
+{
+    close(_socket);
+    waitpid(_pid, nullptr, 0);
+}
+
+void Echo::roundTrip()
+{
+    require(write(_socket, _message.data(), _call) == static_cast<ssize_t>(_call) &&
+                recv(_socket, _message.data(), _reply, MSG_WAITALL) == static_cast<ssize_t>(_reply),
+            "a round trip");
+}
+
 int listenAt(const std::string& path)
 {
     const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
@@ -218,14 +247,16 @@ std::unique_ptr<TAVClient> Daemon::client(bool withBag, const std::string& agent
     return std::move(*client);
 }
 
-Service::Service(std::size_t answerSize, double delay) : _delay(delay)
+Service::Service(std::size_t answerSize, double delay, const std::string& query) : _delay(delay)
 {
     // Results as a service sends them, as many as fill the size.
-    _answer = R"([{"status":"OK","fbq":"7f","duration":1.5,"results":[)";
+    _answer = R"([{"status":"OK",)" + (query.empty() ? "" : fmt::format(R"("query":"{}",)", query)) +
+              R"("fbq":"7f","duration":1.5,"results":[)";
     for (int i = 0; _answer.size() + 3 < answerSize; ++i)
-        _answer += fmt::format(R"({}{{"title":"Result number {} — résumé","url":"https://result.example/page/{}?from=search",)"
-                               R"("description":"What this page is about, in a sentence or two.","score":{}.{},"type":1}})",
-                               i ? "," : "", i, i * 37, i % 10, i);
+        _answer +=
+            fmt::format(R"({}{{"title":"Result number {} — résumé","url":"https://result.example/page/{}?from=search",)"
+                        R"("description":"What this page is about, in a sentence or two.","score":{}.{},"type":1}})",
+                        i ? "," : "", i, i * 37, i % 10, i);
     _answer += "]}]";
 
     _listener = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
@@ -277,7 +308,8 @@ void Service::serve(int connection)
         received.erase(0, end + 4);
         if (!bag && _delay > 0) poll(&fds[1], 1, static_cast<int>(_delay * 1000));
         const std::string body =
-            bag ? platform::toJson(platform::Value::dictionaryOf({{"version", "1"}, {"searchURL", url("/search")}})) : _answer;
+            bag ? platform::toJson(platform::Value::dictionaryOf({{"version", "1"}, {"searchURL", url("/search")}}))
+                : _answer;
         const std::string answer = fmt::format(
             "HTTP/1.1 200 OK\r\nContent-Type: application/json\r\nContent-Length: {}\r\n\r\n{}", body.size(), body);
         if (send(connection, answer.data(), answer.size(), MSG_NOSIGNAL) < 0) break;

@@ -37,7 +37,7 @@ struct Row {
     std::string ours;
     std::string beside; ///< empty: compared with nothing
     double figure = 0;  ///< the ratio, or the figure itself
-    double limit = 0;   ///< at most
+    double limit = 0;   ///< at most; infinite: it is reported only
     std::string unit;   ///< of figure and limit; "×" for a ratio
 };
 
@@ -86,6 +86,22 @@ private:
     int _output = -1;
 };
 
+/// A process at the other end of a bare socket, that answers `call` bytes with `reply` bytes.
+class Echo {
+public:
+    Echo(std::size_t call, std::size_t reply);
+    ~Echo();
+    Echo(const Echo&) = delete;
+    Echo& operator=(const Echo&) = delete;
+    void roundTrip();
+
+private:
+    std::size_t _call, _reply;
+    std::string _message;
+    int _socket = -1;
+    pid_t _pid = -1;
+};
+
 /// A Unix socket in the listening state.
 [[nodiscard]] int listenAt(const std::string& path);
 
@@ -106,10 +122,11 @@ private:
 };
 
 /// A search service over HTTP on loopback: a bag at /bag, and the same JSON answer of `answerSize` bytes for everything
-/// else, `delay` seconds late. A negative delay never answers anything.
+/// else, `delay` seconds late. A negative delay never answers anything. With a `query` the answer's result set says
+/// that it is for that, and may be cached.
 class Service {
 public:
-    explicit Service(std::size_t answerSize, double delay = 0);
+    explicit Service(std::size_t answerSize, double delay = 0, const std::string& query = {});
     ~Service();
     [[nodiscard]] std::string url(const std::string& path) const;
     void setDelay(double delay) { _delay = delay; }
@@ -128,6 +145,8 @@ private:
 // The benchmarks. Each prints what it is doing to standard error.
 [[nodiscard]] std::vector<Row> ipc();
 [[nodiscard]] std::vector<Row> search();
+[[nodiscard]] std::vector<Row> hit();
+[[nodiscard]] std::vector<Row> typing();
 [[nodiscard]] std::vector<Row> startUp();
 [[nodiscard]] std::vector<Row> memory();
 [[nodiscard]] std::vector<Row> waiters();

@@ -2,6 +2,7 @@
 // docs/performance.md has a run, and says how it was made.
 
 #include <algorithm>
+#include <cmath>
 #include <cstdio>
 #include <span>
 #include <string_view>
@@ -17,10 +18,13 @@ int main(int argc, char** argv)
         std::string_view name;
         std::vector<Row> (*run)();
         bool onRequestOnly = false;
-    } kBenchmarks[] = {{"ipc", ipc},         {"search", search},   {"start", startUp},
-                       {"memory", memory},   {"waiters", waiters}, {"idle", idle},
-                       {"tree", cacheTree},  {"append", append},   {"archive", archive},
-                       {"flush", flush},     {"events", events},   {"million", millionEvents, true}};
+    } kBenchmarks[] = {{"ipc", ipc},         {"search", search},
+                       {"hit", hit},         {"typing", typing},
+                       {"start", startUp},   {"memory", memory},
+                       {"waiters", waiters}, {"idle", idle},
+                       {"tree", cacheTree},  {"append", append},
+                       {"archive", archive}, {"flush", flush},
+                       {"events", events},   {"million", millionEvents, true}};
 
     const std::span arguments(argv + 1, argv + argc);
     const auto wanted = [&](const auto& benchmark) {
@@ -43,9 +47,9 @@ int main(int argc, char** argv)
     for (const Row& row : rows) {
         const bool ok = row.figure <= row.limit;
         met = met && ok;
-        std::puts(fmt::format("| {} | {} | {} | {:.2f} {}{} | {:g} {} |", row.what, row.ours,
+        std::puts(fmt::format("| {} | {} | {} | {:.2f} {}{} | {} |", row.what, row.ours,
                               row.beside.empty() ? "–" : row.beside, row.figure, row.unit, ok ? "" : " **missed**",
-                              row.limit, row.unit)
+                              std::isfinite(row.limit) ? fmt::format("{:g} {}", row.limit, row.unit) : "–")
                       .c_str());
     }
     return met ? 0 : 1;

@@ -4,6 +4,7 @@
 #include <cmath>
 #include <cstdlib>
 
+#include "platform/Error.h"
 #include "platform/Text.h"
 
 namespace tavrin {
@@ -21,6 +22,14 @@ std::optional<Date> expireTimeOf(const Value& resultSet, Date now)
     return now + platform::durationFromSeconds(std::clamp(maxAge, -kLongest, kLongest));
 }
 
+/// No larger than it needs to be: it is kept.
+platform::Bytes answerWith(const Value& resultSet)
+{
+    std::string text = platform::toJson(Value::Array{resultSet});
+    text.shrink_to_fit();
+    return platform::Bytes(std::move(text));
+}
+
 std::string queryOf(const Value& resultSet)
 {
     const std::string* query = resultSet["query"].asString();
@@ -36,8 +45,8 @@ float uiScaleOf(const platform::UrlRequest& request)
 } // namespace
 
 CachedResultSet::CachedResultSet(std::string_view input_, std::shared_ptr<const platform::UrlRequest> request_,
-                                 Value resultSet_, std::string uuid_, Date now)
-    : input(platform::lowerCased(input_)), request(std::move(request_)), resultSet(std::move(resultSet_)),
+                                 const Value& resultSet, std::string uuid_, Date now)
+    : input(platform::lowerCased(input_)), request(std::move(request_)), answer(answerWith(resultSet)),
       uuid(std::move(uuid_)), expireTime(expireTimeOf(resultSet, now)), query(queryOf(resultSet)),
       inputLength(platform::utf16Length(input)), queryLength(platform::utf16Length(query)),
       completionScore(static_cast<float>(resultSet["completion_score"].asDouble().value_or(0))),
@@ -48,6 +57,16 @@ std::optional<platform::Uuid> CachedResultSet::userGuid() const
 {
     const std::string* header = request->headers.find("X-Quorvane-UserGuid");
     return header ? platform::Uuid::parse(*header) : std::nullopt;
+}
+
+Value CachedResultSet::resultSet() const
+{
+    return platform::parseJson(answer.view()).value_or(Value())[0];
+}
+
+std::size_t CachedResultSet::resultSetSize() const
+{
+    return answer.size() - std::string_view("[]").size();
 }
 
 CachedUse useOf(const CachedResultSet& set, std::size_t typedLength, double scale, Date now)

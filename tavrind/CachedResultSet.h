@@ -6,22 +6,24 @@
 #include <span>
 #include <string>
 
+#include "platform/Bytes.h"
 #include "platform/UrlSession.h"
 #include "platform/Uuid.h"
 #include "platform/Value.h"
 
 namespace tavrin {
 
-/// One result set of an answer of the service, as the query cache keeps it. Immutable and shared.
+/// One result set of an answer of the service, as the query cache keeps it: as the text that answers, so that a hit
+/// makes nothing. Immutable and shared.
 struct CachedResultSet : std::enable_shared_from_this<CachedResultSet> {
     /// `input` is what the user had typed, `resultSet` an element of the answer to `request`, `uuid` that of the
     /// request's start record. The set is usable from `now` for the seconds of its "max_age": without end for none.
     CachedResultSet(std::string_view input, std::shared_ptr<const platform::UrlRequest> request,
-                    platform::Value resultSet, std::string uuid, platform::Date now);
+                    const platform::Value& resultSet, std::string uuid, platform::Date now);
 
     const std::string input; ///< in lower case
     const std::shared_ptr<const platform::UrlRequest> request;
-    const platform::Value resultSet;
+    const platform::Bytes answer; ///< JSON of an array that holds the result set alone
     const std::string uuid;
     const std::optional<platform::Date> expireTime;
 
@@ -32,6 +34,8 @@ struct CachedResultSet : std::enable_shared_from_this<CachedResultSet> {
     const float completionScore;   ///< the service's; 0 for none
     const float uiScale;           ///< of the client's screen, as the service was told; 0 for none
     [[nodiscard]] std::optional<platform::Uuid> userGuid() const; ///< as the service was told
+    [[nodiscard]] platform::Value resultSet() const;              ///< read from the answer
+    [[nodiscard]] std::size_t resultSetSize() const;              ///< in bytes of JSON
 };
 
 /// What a look-up does with a set whose query begins with what was typed.

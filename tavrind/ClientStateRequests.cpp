@@ -262,7 +262,7 @@ bool ClientState::_answerFromCache(Exchange& exchange)
     auto reply = std::make_shared<TAVReply>();
     reply->scale = query.scale;
     if (query.verboseReply) reply->httpRequest = record(*hit->request);
-    reply->rawResponse = Bytes(platform::toJson(Value::Array{hit->resultSet}));
+    reply->rawResponse = hit->answer;
     reply->geoSessionEntityString = _assembly.requestFactory->getMapsUserSessionEntity();
     exchange.answer(std::move(reply), {});
 

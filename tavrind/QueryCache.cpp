@@ -24,7 +24,7 @@ const platform::Log& log()
 
 std::size_t costOf(const CachedResultSet& set)
 {
-    return static_cast<std::size_t>(static_cast<double>(platform::jsonSize(set.resultSet)) * 1.5);
+    return static_cast<std::size_t>(static_cast<double>(set.resultSetSize()) * 1.5);
 }
 
 } // namespace

@@ -21,7 +21,7 @@ std::shared_ptr<const CachedResultSet> makeSet(std::string_view input, Dictionar
 {
     auto request = std::make_shared<platform::UrlRequest>();
     if (scale > 0) request->headers.set("X-Quorvane-UI-Scale", fmt::format("{:.1f}", scale));
-    return std::make_shared<const CachedResultSet>(input, std::move(request), std::move(resultSet), "uuid", now);
+    return std::make_shared<const CachedResultSet>(input, std::move(request), Value(std::move(resultSet)), "uuid", now);
 }
 
 TEST(CachedResultSet, ReadsWhatItIsMadeFrom)
@@ -35,6 +35,9 @@ TEST(CachedResultSet, ReadsWhatItIsMadeFrom)
     EXPECT_EQ(set->completionScore, 0.5f);
     EXPECT_EQ(set->uiScale, 2.0f);
     EXPECT_FALSE(set->userGuid());
+    EXPECT_EQ(set->answer.view(), R"([{"query":"WÉATHER 😀","max_age":60,"completion_score":0.5}])");
+    EXPECT_EQ(set->resultSet()["query"], Value("WÉATHER 😀"));
+    EXPECT_EQ(set->resultSetSize(), platform::jsonSize(set->resultSet()));
 
     const auto odd = makeSet("w", {{"query", 3}, {"max_age", "60"}, {"completion_score", "high"}});
     EXPECT_TRUE(odd->query.empty() && !odd->expireTime && odd->completionScore == 0 && odd->uiScale == 0);
@@ -214,7 +217,7 @@ TEST_F(QueryCacheTest, ASetOutlivesTheCache)
     cache->removeAllObjects();
     device.drain();
     cache.reset();
-    EXPECT_EQ(set->resultSet["query"], Value("weather"));
+    EXPECT_EQ(set->resultSet()["query"], Value("weather"));
     EXPECT_EQ(device.memoryPressure.watchers, 0);
 }
 
@@ -260,7 +263,7 @@ TEST_F(QueryCacheTest, FollowsItsRulesThroughWhateverHappens)
             request.scale = upTo(3);
             const auto set = cache->getRequest(request);
             const auto expected = model.get(request.queryString, request.scale, now);
-            ASSERT_EQ(set ? set->resultSet : Value(), expected ? expected->set : Value())
+            ASSERT_EQ(set ? set->answer.view() : "", expected ? platform::toJson(Value::Array{expected->set}) : "")
                 << i << ": " << request.queryString << " " << request.scale;
             hits += set ? 1 : 0;
         }
@@ -286,16 +289,19 @@ TEST_F(QueryCacheTest, ASearchIsAnsweredFromIt)
     EXPECT_EQ(session->last<TAVSkipSearchFeedback>()->triggerEvent, SkipSearchTrigger::CacheHit);
     EXPECT_EQ(session->last<TAVSkipSearchFeedback>()->input, "Weathe");
     EXPECT_EQ(session->last<TAVSkipSearchFeedback>()->uuid, uuid);
+    const Value further = search(*connection, 3, "weather")->argument(1)["rawResponse"];
+    EXPECT_EQ(further.asBytes()->data(), hit->argument(1)["rawResponse"].asBytes()->data())
+        << "shared, not written anew";
     EXPECT_EQ(tasks().size(), before);
 
     const Value item = Value::dictionaryOf({{"class", "TAVQueryItem"}, {"name", "x"}, {"value", "y"}});
-    EXPECT_TRUE(search(*connection, 3, "weathe", {{"queryItems", Value::Array{item}}})->pending())
+    EXPECT_TRUE(search(*connection, 4, "weathe", {{"queryItems", Value::Array{item}}})->pending())
         << "items of its own";
-    EXPECT_TRUE(search(*connection, 4, "weathe", {{"scale", 3.0}})->pending()) << "another screen";
-    EXPECT_TRUE(search(*connection, 5, "weathers")->pending()) << "errors aren't kept";
+    EXPECT_TRUE(search(*connection, 5, "weathe", {{"scale", 3.0}})->pending()) << "another screen";
+    EXPECT_TRUE(search(*connection, 6, "weathers")->pending()) << "errors aren't kept";
 
     configure(*connection, "com.quorvane.vistrel", "Vistrel/5");
-    EXPECT_TRUE(search(*connection, 6, "weathe")->pending()) << "a new version of the client asks anew";
+    EXPECT_TRUE(search(*connection, 7, "weathe")->pending()) << "a new version of the client asks anew";
 }
 
 TEST_F(QueryCacheTest, CanBeSwitchedOff)
