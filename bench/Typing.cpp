@@ -1,6 +1,7 @@
 // Searches that are answered from memory: a single one beside an echo of as many bytes over a bare socket, and those of
 // users who type beside a model of the cache's rules.
 
+#include <cstdio>
 #include <cstdlib>
 #include <limits>
 
@@ -12,6 +13,7 @@
 #include "CoreTavrin/TAVReply.h"
 #include "CoreTavrin/TAVRequest.h"
 #include "platform/Files.h"
+#include "platform/Text.h"
 #include "tests/support/CacheModel.h"
 #include "tools/replay/Corpus.h"
 #include "tools/replay/Report.h"
@@ -143,7 +145,8 @@ std::vector<Row> typing()
             }
             requests.push_back(latency);
             differences += expected ? 1 : 0;
-            for (const Value& set : *platform::parseJson(text).value().asArray())
+            const Value sets = platform::parseJson(text).value();
+            for (const Value& set : *sets.asArray())
                 if (set["status"] != Value("ERROR")) model.put(key.text, kScale, set, {});
         }
     }
