@@ -28,7 +28,9 @@ using namespace std::chrono_literals;
 constexpr const char* kTableKey = "download_resources";
 constexpr const char* kIdentifierHeader = "X-Quorvane-Download-Identifier";
 constexpr const char* kDirectory = "com.quorvane.tavrind";
-constexpr platform::Duration kDelay = 60s;
+constexpr const char* kDelayKey = "TAVDownloadDelay"; // for development
+constexpr std::int64_t kDelay = 60;                   // seconds
+constexpr std::int64_t kLongestDelay = 24 * 60 * 60;
 constexpr platform::Duration kTaskListTimeout = 5s;
 
 const platform::Log& log()
@@ -200,7 +202,7 @@ void DownloadManager::_addResource(const std::string& identifier, const std::opt
         return;
     }
     if (!_pending.insert_or_assign(identifier, *url).second) return;
-    _queue->after(kDelay, [weak = weak_from_this(), identifier] {
+    _queue->after(_delay(), [weak = weak_from_this(), identifier] {
         if (const auto self = weak.lock()) self->_startPending(identifier);
     });
 }
@@ -219,7 +221,7 @@ void DownloadManager::_downloadResource(const DownloadResource& resource, const 
 {
     UrlRequest request = _createDownloadRequest(resource, url);
     log().log("starting download of {} reason: {} delay: {:f} headers: {}", url.string(), reason,
-              platform::toSeconds(kDelay), textOf(request.headers));
+              platform::toSeconds(_delay()), textOf(request.headers));
     const auto task = _assembly.downloadURLSession->downloadTask(std::move(request));
     if (!task) return log().error("download task error {}", task.error().description());
     (*task)->setNote(url.string()); // the request's URL has the service's items too
@@ -243,6 +245,12 @@ std::string DownloadManager::_resourceVersion(const DownloadResource& resource) 
         return lookup ? lookup->signatureFromURL(*resource.redirectUrl).value_or("") : "";
     }
     return resource.url ? resource.url->queryValue("version").value_or("") : "";
+}
+
+platform::Duration DownloadManager::_delay() const
+{
+    const std::int64_t seconds = _assembly.userDefaults.integer(kDelayKey).value_or(kDelay);
+    return std::chrono::seconds(seconds >= 0 && seconds <= kLongestDelay ? seconds : kDelay);
 }
 
 bool DownloadManager::_isAllowed(const std::string& identifier) const
@@ -271,13 +279,17 @@ void DownloadManager::_deleteResource(const std::string& identifier, File file)
     log().info("deleting resource: {}", identifier);
     _resources.erase(identifier);
     _pending.erase(identifier);
-    if (file == File::Keep) return;
+    if (file == File::Remove) _removeFile(identifier);
+    _assembly.notificationCenter.post({.name = TAVFileDeletedNotification, .userInfo = {{"identifier", identifier}}});
+}
+
+void DownloadManager::_removeFile(const std::string& identifier) const
+{
     const auto path = _pathToResource(identifier);
     if (!path) return log().error("error trying to get path to file for deletion {}", path.error().description());
     const auto removed = _assembly.fileManager.remove(*path);
     if (!removed && removed.error().code != ENOENT)
         log().error("error deleting resource {}: {}", identifier, removed.error().description());
-    _assembly.notificationCenter.post({.name = TAVFileDeletedNotification, .userInfo = {{"identifier", identifier}}});
 }
 
 void DownloadManager::taskDidFinishDownloading(const std::shared_ptr<platform::BackgroundTask>& task,

@@ -24,7 +24,7 @@ class TAVBag;
 
 /// A resource's file was replaced: "identifier" (std::string) and "url" (std::filesystem::path, where it is).
 inline constexpr const char* TAVFileDownloadCompletedNotification = "TAVFileDownloadCompletedNotification";
-/// A resource's file was deleted: "identifier".
+/// A resource was deleted, or is to be fetched anew for another place: "identifier".
 inline constexpr const char* TAVFileDeletedNotification = "TAVFileDeletedNotification";
 
 /// What the download manager needs to know of lookup hints, from whoever installs them. Any thread.
@@ -39,10 +39,12 @@ public:
 /// Keeps a local copy of each resource file that the bag lists.
 ///
 /// Every bag cancels what is under way and gives each resource a reason to be downloaded (`downloadReason`), or none. A
-/// download starts 60 s after its reason came up, if that still holds then; reasons that come up meanwhile join it. The
-/// session has a day to carry it out, across restarts. An answer of status 200 replaces the file in one step, 304
-/// leaves it; only then is the resource's URL noted, so that a download that failed has its reason again with the next
-/// bag. A resource that the bag no longer lists is deleted.
+/// download starts 60 s after its reason came up (the user default "TAVDownloadDelay", if it is set), if that still
+/// holds then; reasons that come up meanwhile join it. The session has a day to carry it out, across restarts: a
+/// download of an earlier process goes on until there is a bag. The one on disk is such a bag too, so a restarted
+/// daemon that has one begins its downloads again; what had arrived by then is installed all the same. An answer of
+/// status 200 replaces the file in one step, 304 leaves it; only then is the resource's URL noted, so that a download
+/// that failed has its reason again with the next bag. A resource that the bag no longer lists is deleted.
 ///
 /// Any thread.
 class DownloadManager : public platform::BackgroundSessionDelegate,
@@ -86,11 +88,13 @@ private:
     void _downloadBagResources(const std::shared_ptr<const TAVBag>& bag);
     void _addResource(const std::string& identifier, const std::optional<platform::Url>& url);
     void _deleteResource(const std::string& identifier, File file);
+    void _removeFile(const std::string& identifier) const;
     void _startPending(const std::string& identifier);
     void _downloadResource(const DownloadResource& resource, const platform::Url& url, std::string_view reason);
     [[nodiscard]] platform::UrlRequest _createDownloadRequest(const DownloadResource& resource,
                                                               const platform::Url& url) const;
     [[nodiscard]] std::string _resourceVersion(const DownloadResource& resource) const;
+    [[nodiscard]] platform::Duration _delay() const;
     [[nodiscard]] bool _isAllowed(const std::string& identifier) const;
     [[nodiscard]] bool _fileExists(const std::string& identifier) const;
     [[nodiscard]] platform::Result<std::filesystem::path> _pathToResource(const std::string& identifier) const;

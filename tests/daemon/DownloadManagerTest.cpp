@@ -80,6 +80,15 @@ struct DownloadManagerTest : testing::Test {
         device.drain();
     }
 
+    /// Another process, whose session takes up what is under way.
+    void restart()
+    {
+        const auto task = tasks().back();
+        makeManager();
+        tasks().push_back(task);
+        device.background.sessions.at("com.quorvane.tavrind")->adopt(*task);
+    }
+
     void bag(Dictionary resources)
     {
         resources.set("supportedGeoLocationSources", Value::Array{"wifi"});
@@ -122,6 +131,7 @@ struct DownloadManagerTest : testing::Test {
     Assembly assembly{device.device};
     std::shared_ptr<FakeLookup> lookup = std::make_shared<FakeLookup>();
     std::shared_ptr<DownloadManager> manager;
+    std::string watched = "TAVQIFeatures"; ///< whose deletion is told; a bag deletes all that it doesn't list
     std::vector<std::string> told;
     platform::NotificationCenter::Token completed =
         device.notifications.observe(TAVFileDownloadCompletedNotification, [this](const platform::Notification& n) {
@@ -131,7 +141,7 @@ struct DownloadManagerTest : testing::Test {
     platform::NotificationCenter::Token deleted =
         device.notifications.observe(TAVFileDeletedNotification, [this](const platform::Notification& n) {
             if (n.userInfo.contains("url")) ADD_FAILURE();
-            if (n.get<std::string>("identifier") == "TAVQIFeatures") told.push_back("deleted");
+            if (n.get<std::string>("identifier") == watched) told.push_back("deleted");
         });
 };
 
@@ -218,6 +228,25 @@ TEST_F(DownloadManagerTest, WhatFailsLeavesTheOldFileAndIsTriedAgainWithTheNextB
     EXPECT_EQ(contents("TAVQIFeatures"), "") << "an empty answer is an empty file";
 }
 
+TEST_F(DownloadManagerTest, WhatStandsInAResourcesPlaceIsNoResourceAndIsNotTouched)
+{
+    device.files.directories.insert(directory / "TAVQIFeatures");
+    for (std::size_t bags = 1; bags <= 2; ++bags) {
+        download("TAVQIFeatures", "https://r.example/f");
+        ASSERT_EQ(tasks().size(), bags) << "with every bag again";
+        deliver(200, "new");
+        EXPECT_EQ(log.count("error copying download"), static_cast<int>(bags));
+        EXPECT_EQ(manager->fileHandleForResource("TAVQIFeatures").error().code, 500);
+    }
+    EXPECT_EQ(told, std::vector<std::string>());
+    bag({});
+    EXPECT_TRUE(device.files.directories.contains(directory / "TAVQIFeatures"));
+    device.files.directories.erase(directory / "TAVQIFeatures");
+    download("TAVQIFeatures", "https://r.example/f");
+    deliver(200, "new");
+    EXPECT_EQ(contents("TAVQIFeatures"), "new");
+}
+
 TEST_F(DownloadManagerTest, BagsInQuickSuccessionLeadToOneDownloadOfTheLast)
 {
     bag({{"TAVQIFeatures", "https://r.example/f?version=1"}, {"TAVVistrelModels", "https://r.example/m"}});
@@ -263,7 +292,8 @@ TEST_F(DownloadManagerTest, LookupHintsFollowTheBagTheirRedirectAndTheLocation)
 
     const std::string hints = "TAVLookupHintsWeekly";
     const auto first = download(hints, "https://r.example/hints?version=1");
-    EXPECT_EQ(header(first->originalRequest(), "X-Quorvane-FuzzedLatLong"), assembly.requestFactory->context().geoLocationLatLng);
+    EXPECT_EQ(header(first->originalRequest(), "X-Quorvane-FuzzedLatLong"),
+              assembly.requestFactory->context().geoLocationLatLng);
     deliver(200, "x", urlOf("https://r.example/de/hints/2026/w1"));
     EXPECT_EQ(device.userDefaults.value("download_resources")[hints]["redirect_url"],
               Value("https://r.example/de/hints/2026/w1"));
@@ -281,6 +311,8 @@ TEST_F(DownloadManagerTest, LookupHintsFollowTheBagTheirRedirectAndTheLocation)
     EXPECT_TRUE(log.count("TAVLookupHintsWeekly is disabled, not downloading"));
     lookup->enabled = true;
 
+    watched = hints;
+    told.clear();
     device.location.moveTo(platform::fuzz(47.40, 8.56, "wifi")); // 4 km
     device.drain();
     EXPECT_TRUE(manager->resourceForKey(hints));
@@ -288,21 +320,57 @@ TEST_F(DownloadManagerTest, LookupHintsFollowTheBagTheirRedirectAndTheLocation)
     device.drain();
     EXPECT_FALSE(manager->resourceForKey(hints));
     EXPECT_EQ(contents(hints), "x");
+    EXPECT_EQ(told, std::vector<std::string>{"deleted"}) << "whoever uses the hints of another place stops";
     const auto third = download(hints, "https://r.example/hints?version=1");
     EXPECT_EQ(header(third->originalRequest(), "If-None-Match"), "") << "another place has other hints";
 }
 
 TEST_F(DownloadManagerTest, ADownloadOutlivesTheProcess)
 {
-    const auto task = download("TAVQIFeatures", "https://r.example/f?version=7");
-    makeManager();
-    tasks().push_back(task); // the session takes it up
-    device.background.sessions.at("com.quorvane.tavrind")->adopt(*task);
+    download("TAVQIFeatures", "https://r.example/f?version=7");
+    restart();
     deliver(200, "seven");
     EXPECT_EQ(contents("TAVQIFeatures"), "seven");
     EXPECT_EQ(manager->resourceVersions(), (Dictionary{{"TAVQIFeatures", "7"}}));
     makeManager();
     EXPECT_EQ(manager->resourceVersions(), (Dictionary{{"TAVQIFeatures", "7"}})) << "before the first bag";
+}
+
+TEST_F(DownloadManagerTest, ABagOnDiskBeginsTheDownloadsOfAnEarlierProcessAgain)
+{
+    download("TAVQIFeatures", "https://r.example/f?version=7");
+    restart();
+    const auto again = download("TAVQIFeatures", "https://r.example/f?version=7");
+    ASSERT_EQ(tasks().size(), 2u);
+    EXPECT_TRUE(tasks()[0]->finished) << "cancelled";
+    EXPECT_EQ(again->originalRequest().url, tasks()[0]->originalRequest().url);
+    deliver(200, "seven");
+    EXPECT_EQ(contents("TAVQIFeatures"), "seven");
+
+    download("TAVQIFeatures", "https://r.example/f?version=8");
+    restart();
+    deliver(200, "eight"); // had arrived before the bag
+    download("TAVQIFeatures", "https://r.example/f?version=8");
+    EXPECT_EQ(tasks().size(), 1u) << "not fetched twice";
+    EXPECT_EQ(contents("TAVQIFeatures"), "eight");
+}
+
+TEST_F(DownloadManagerTest, TheDelayCanBeShortenedForDevelopment)
+{
+    for (const Value& wrong : {Value(-1), Value(86'401), Value("soon"), Value(1.5), Value(Value::Array{0})}) {
+        device.userDefaults.set("TAVDownloadDelay", wrong);
+        bag({{"TAVQIFeatures", "https://r.example/f"}});
+        device.advance(59s);
+        EXPECT_TRUE(tasks().empty()) << platform::toJson(wrong);
+        bag({});
+    }
+    device.userDefaults.set("TAVDownloadDelay", 2);
+    bag({{"TAVQIFeatures", "https://r.example/f"}});
+    device.advance(1s);
+    EXPECT_TRUE(tasks().empty());
+    device.advance(1s);
+    EXPECT_EQ(tasks().size(), 1u);
+    EXPECT_TRUE(log.count("delay: 2.000000"));
 }
 
 TEST_F(DownloadManagerTest, ServesResourcesAndNoOtherFiles)
