@@ -1,5 +1,6 @@
 #include "tools/devserver/Bag.h"
 
+#include <map>
 #include <set>
 
 #include <gtest/gtest.h>
@@ -61,6 +62,23 @@ TEST(Bag, TheVersionOnlyCountsUp)
     EXPECT_EQ(bag.document()["version"], Value("x"));
     ASSERT_TRUE(bag.merge(json(R"({"version": 50})")));
     EXPECT_EQ(bag.document()["version"], Value(50)) << "a number ends the override";
+}
+
+TEST(Bag, ResourcesHaveVersionsOfTheirOwn)
+{
+    Bag bag("https://h");
+    const auto versions = [&] {
+        std::map<std::string, int> resources;
+        for (const auto name : tavrin::kTAVResourceIdentifiers)
+            ++resources[tavrin::TAVBag(bag.document(), "a").resourceURL(name)->queryValue("version").value_or("")];
+        return resources;
+    };
+    EXPECT_EQ(bag.bumpResources("TAVQIFeatures"), 2);
+    EXPECT_EQ(bag.bumpResources("TAVQIFeatures"), 3);
+    EXPECT_EQ(versions(), (std::map<std::string, int>{{"1", 9}, {"3", 1}}));
+    EXPECT_FALSE(bag.bumpResources("Nothing"));
+    EXPECT_EQ(bag.bumpResources(), 4) << "every one has a version that it didn't have";
+    EXPECT_EQ(versions(), (std::map<std::string, int>{{"4", 10}}));
 }
 
 TEST(Resources, TheVersionAtHandIsNotSentAgain)

@@ -111,6 +111,8 @@ TEST_F(ServiceTest, ControlRefusesWhatItDoesNotKnowAndSaysWhatItDoes)
         {"/control/search", R"({"max_age": -1})"},
         {"/control/search", R"({"maxage": 1})"},
         {"/control/bag", "7"},
+        {"/control/resources/bump", R"({"name": "Nothing"})"},
+        {"/control/resources/bump", R"({"name": 7})"},
     };
     for (const auto& [target, body] : bad) {
         const Answer answer = post(target, body);
@@ -170,6 +172,17 @@ TEST_F(ServiceTest, FaultsStrikeTheirEndpointAndResetEndsThem)
     EXPECT_EQ(post("/control/reset").status, 200);
     EXPECT_EQ(json(get("/bag"))["isEnabled"], Value(true));
     EXPECT_EQ(json(get("/search?q=weather"))[0]["max_age"], Value(60));
+}
+
+TEST_F(ServiceTest, AResourceCanBeHalvedOrEmptied)
+{
+    const std::string whole = get("/resources/TAVQIFeatures").body;
+    ASSERT_EQ(post("/control/faults", R"({"endpoint": "resource", "fault": "half", "count": 1})").status, 200);
+    ASSERT_EQ(post("/control/faults", R"({"endpoint": "resource", "fault": "empty", "count": 1})").status, 200);
+    EXPECT_EQ(get("/resources/TAVQIFeatures").body, whole.substr(0, whole.size() / 2));
+    EXPECT_EQ(get("/resources/TAVQIFeatures").body, "");
+    EXPECT_EQ(json(post("/control/resources/bump", R"({"name": "TAVQIFeatures"})"))["resource_version"], Value(2));
+    EXPECT_EQ(json(get("/bag"))["TAVQIFeatures"], Value(service.base + "/resources/TAVQIFeatures?version=2"));
 }
 
 TEST_F(ServiceTest, ARaisedBagVersionIsAnnounced)

@@ -1,6 +1,10 @@
 #include "tools/devserver/Bag.h"
 
+#include <algorithm>
+#include <ranges>
+
 #include <fmt/format.h>
+#include <fmt/ranges.h>
 
 #include "tools/devserver/Resources.h"
 
@@ -15,7 +19,10 @@ constexpr std::size_t kMaximumOverrides = 256 * 1024; // bytes of JSON
 
 } // namespace
 
-Bag::Bag(std::string base) : _base(std::move(base)) {}
+Bag::Bag(std::string base) : _base(std::move(base))
+{
+    for (const std::string_view name : resourceNames()) _resourceVersions.emplace(name, 1);
+}
 
 Value Bag::document() const
 {
@@ -38,8 +45,7 @@ Value Bag::document() const
         {"subscriptionProviderBundleIdentifierWhitelist", Value::Array{"com.quorvane.films"}},
         {"subscriptionTTL", 86400},
     };
-    for (const std::string_view name : resourceNames())
-        bag.set(std::string(name), resourceUrl(_base, name, _resourceVersion));
+    for (const auto& [name, version] : _resourceVersions) bag.set(name, resourceUrl(_base, name, version));
     for (const auto& [key, value] : _overrides) {
         if (value.isNull())
             bag.remove(key);
@@ -61,10 +67,19 @@ std::int64_t Bag::bump()
     return ++_version;
 }
 
-std::int64_t Bag::bumpResources()
+std::expected<std::int64_t, std::string> Bag::bumpResources(const std::string& name)
 {
     const std::lock_guard lock(_mutex);
-    return ++_resourceVersion;
+    if (!name.empty()) {
+        const auto found = _resourceVersions.find(name);
+        if (found == _resourceVersions.end())
+            return std::unexpected(
+                fmt::format("no resource \"{}\"; there are {}", name, fmt::join(resourceNames(), ", ")));
+        return ++found->second;
+    }
+    const std::int64_t next = std::ranges::max(std::views::values(_resourceVersions)) + 1;
+    for (auto& [each, version] : _resourceVersions) version = next;
+    return next;
 }
 
 std::expected<void, std::string> Bag::merge(const Value& keys)

@@ -2,6 +2,7 @@
 
 #include <cstdint>
 #include <expected>
+#include <map>
 #include <mutex>
 #include <string>
 
@@ -20,8 +21,9 @@ public:
 
     /// Raises the version by 1 and returns it.
     std::int64_t bump();
-    /// Raises the version of the downloadable resources, and with it their URLs, by 1 and returns it.
-    std::int64_t bumpResources();
+    /// Raises the version of all downloadable resources, and with it their URLs, above what any of them had, and
+    /// returns it; or of the one that is named. Refused with a reason: a name that none of them has.
+    std::expected<std::int64_t, std::string> bumpResources(const std::string& name = "");
     /// Puts an object's keys over the bag's; null removes a key; a whole "version" sets the number that `bump` raises.
     /// Refused with a reason: anything but an object, and more overrides than are kept.
     std::expected<void, std::string> merge(const platform::Value& keys);
@@ -32,7 +34,7 @@ private:
     const std::string _base;
     mutable std::mutex _mutex;
     std::int64_t _version = 1;
-    std::int64_t _resourceVersion = 1;
+    std::map<std::string, std::int64_t, std::less<>> _resourceVersions; ///< of every resource
     platform::Dictionary _overrides;
 };
 

@@ -99,9 +99,13 @@ Answer bumpBag(Service& service, const Value&, const Request&)
     return jsonAnswer(Value::dictionaryOf({{"version", service.bag.bump()}}));
 }
 
-Answer bumpResources(Service& service, const Value&, const Request&)
+Answer bumpResources(Service& service, const Value& body, const Request&)
 {
-    return jsonAnswer(Value::dictionaryOf({{"resource_version", service.bag.bumpResources()}}));
+    const std::string* name = body["name"].asString();
+    if (!name && !body["name"].isNull()) return errorAnswer(400, "\"name\" is a resource's name; without it all rise");
+    const auto version = service.bag.bumpResources(name ? *name : "");
+    if (!version) return errorAnswer(400, version.error());
+    return jsonAnswer(Value::dictionaryOf({{"resource_version", *version}}));
 }
 
 Answer setSearch(Service& service, const Value& body, const Request&)
@@ -163,7 +167,7 @@ const std::vector<Call>& calls()
         {"POST", "release", release, {}},
         {"POST", "bag", mergeBag, {}, true},
         {"POST", "bag/bump", bumpBag, {}},
-        {"POST", "resources/bump", bumpResources, {}},
+        {"POST", "resources/bump", bumpResources, {"name"}},
         {"POST", "search", setSearch, {"max_age"}},
         {"POST", "reset", reset, {}},
     };

@@ -30,6 +30,8 @@ constexpr KindEntry kKinds[] = {
     {"hang", Kind::Hang, ""},
     {"status", Kind::Status, "CODE", 200, 599},
     {"cut", Kind::Cut, ""},
+    {"half", Kind::Half, ""},
+    {"empty", Kind::Empty, ""},
     {"notjson", Kind::NotJson, ""},
     {"wrongtype", Kind::WrongType, ""},
     {"wrongvalues", Kind::WrongValues, ""},
@@ -132,6 +134,8 @@ void spoil(Answer& answer, const Fault& fault, const Request& request)
         answer.status = static_cast<int>(fault.number);
         return;
     case Kind::Cut: answer.cut = true; return;
+    case Kind::Half: answer.body.resize(answer.body.size() / 2); return;
+    case Kind::Empty: answer.body.clear(); return;
     case Kind::NotJson: answer.body = "<html><body>Something else answered here.</body></html>\n"; return;
     case Kind::WrongType:
     case Kind::WrongValues: answer.body = spoiltJson(answer.body, fault.kind); return;

@@ -15,7 +15,22 @@ namespace devserver {
 
 /// What goes wrong on demand, of one request.
 struct Fault {
-    enum class Kind { Delay, Hang, Status, Cut, NotJson, WrongType, WrongValues, Huge, Deep, Redirect, GzipBomb, RetryAfter };
+    enum class Kind {
+        Delay,
+        Hang,
+        Status,
+        Cut,
+        Half,
+        Empty,
+        NotJson,
+        WrongType,
+        WrongValues,
+        Huge,
+        Deep,
+        Redirect,
+        GzipBomb,
+        RetryAfter
+    };
     Kind kind = Kind::Delay;
     std::uint64_t number = 0; ///< milliseconds, status code, bytes, depth or seconds; 0 where the kind takes none
 
