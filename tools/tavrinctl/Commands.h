@@ -21,6 +21,8 @@ void addSearchCommand(CLI::App& app, Command& chosen);
 void addOtherRequestCommands(CLI::App& app, Command& chosen);
 /// bag, sessions, status and stats.
 void addInspectCommands(CLI::App& app, Command& chosen);
+/// resource.
+void addResourceCommand(CLI::App& app, Command& chosen);
 /// watch; flush watch, stop and dump.
 void addFlusherCommands(CLI::App& app, Command& chosen);
 /// feedback, and feedback send and records.

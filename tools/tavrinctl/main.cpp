@@ -29,6 +29,7 @@ int main(int argc, char** argv)
     addSearchCommand(app, chosen);
     addOtherRequestCommands(app, chosen);
     addInspectCommands(app, chosen);
+    addResourceCommand(app, chosen);
     addFlusherCommands(app, chosen);
     addFeedbackCommands(app, chosen);
     addSessionCommand(app, chosen);
