@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cstdlib>
 #include <filesystem>
+#include <fstream>
 
 #include <fmt/format.h>
 
@@ -25,13 +26,24 @@ std::uint64_t contextSwitches(pid_t pid)
 }
 
 /// A call that needs neither configuration nor bag, on a connection of its own.
-double startToFirstAnswer(const std::string& program)
+double startToFirstAnswer(const std::string& program, const std::vector<std::string>& environment = {})
 {
     const double begin = now();
-    const Daemon daemon("http://127.0.0.1:9/bag", {}, program);
+    const Daemon daemon("http://127.0.0.1:9/bag", environment, program);
     const auto client = TAVClient::connect(daemon.address());
     if (!client || !(*client)->sessions()) std::abort();
     return now() - begin;
+}
+
+/// A data directory with so many applications.
+std::filesystem::path applications(const Directory& home, const std::string& name, int count)
+{
+    const auto folder = home / name / "applications";
+    std::filesystem::create_directories(folder);
+    for (int i = 0; i < count; ++i)
+        std::ofstream(folder / fmt::format("org.example.Application{}.desktop", i))
+            << "[Desktop Entry]\nType=Application\nName=Application\nExec=true\n";
+    return folder.parent_path();
 }
 
 } // namespace
@@ -41,9 +53,19 @@ std::vector<Row> startUp()
     Row row = compare(
         "start to first answered call, beside a program with the same libraries", 100, 1.5,
         [] { return startToFirstAnswer(TAVRIND); }, [] { return startToFirstAnswer(BASELINE); });
+    const Directory home;
+    const auto with = [&](const std::filesystem::path& data) {
+        return startToFirstAnswer(TAVRIND, {"XDG_DATA_DIRS=" + data.string(), "XDG_DATA_HOME=" + data.string()});
+    };
+    const auto many = applications(home, "many", 500), none = applications(home, "none", 0);
+    Row applicationsRow = compare(
+        "start with 500 .desktop files, beside a start with none", 100, 1.1, [&] { return with(many); },
+        [&] { return with(none); });
     std::vector<double> starts;
     for (int i = 0; i < 21; ++i) starts.push_back(startToFirstAnswer(TAVRIND) * 1000);
-    return {row, {"the same, in milliseconds", fmt::format("{:.1f} ms", median(starts)), "", median(starts), 40, "ms"}};
+    return {row,
+            {"the same, in milliseconds", fmt::format("{:.1f} ms", median(starts)), "", median(starts), 40, "ms"},
+            applicationsRow};
 }
 
 std::vector<Row> memory()

@@ -152,6 +152,8 @@ private:
 [[nodiscard]] std::vector<Row> waiters();
 [[nodiscard]] std::vector<Row> idle();
 [[nodiscard]] std::vector<Row> cacheTree();
+[[nodiscard]] std::vector<Row> signature();
+[[nodiscard]] std::vector<Row> lookupFilter();
 [[nodiscard]] std::vector<Row> append();
 [[nodiscard]] std::vector<Row> archive();
 [[nodiscard]] std::vector<Row> flush();

@@ -18,13 +18,22 @@ int main(int argc, char** argv)
         std::string_view name;
         std::vector<Row> (*run)();
         bool onRequestOnly = false;
-    } kBenchmarks[] = {{"ipc", ipc},         {"search", search},
-                       {"hit", hit},         {"typing", typing},
-                       {"start", startUp},   {"memory", memory},
-                       {"waiters", waiters}, {"idle", idle},
-                       {"tree", cacheTree},  {"append", append},
-                       {"archive", archive}, {"flush", flush},
-                       {"events", events},   {"million", millionEvents, true}};
+    } kBenchmarks[] = {{"ipc", ipc},
+                       {"search", search},
+                        {"hit", hit},
+                        {"typing", typing},
+                       {"start", startUp},
+                       {"memory", memory},
+                       {"waiters", waiters},
+                       {"idle", idle},
+                       {"tree", cacheTree},
+                       {"signature", signature},
+                       {"filter", lookupFilter},
+                       {"append", append},
+                       {"archive", archive},
+                       {"flush", flush},
+                       {"events", events},
+                       {"million", millionEvents, true}};
 
     const std::span arguments(argv + 1, argv + argc);
     const auto wanted = [&](const auto& benchmark) {

@@ -292,6 +292,17 @@ struct JsonDocument::Parsed {
         dom::array array;
         return root.get(array) == simdjson::SUCCESS ? std::optional(array) : std::nullopt;
     }
+
+    /// The entry of the document's dictionary, if it is a T.
+    template <class T> [[nodiscard]] std::optional<T> entry(std::string_view wanted) const
+    {
+        std::optional<dom::element> last;
+        if (dom::object object; root.get(object) == simdjson::SUCCESS)
+            for (const auto& [key, element] : object)
+                if (key == wanted) last = element;
+        T value;
+        return last && last->get(value) == simdjson::SUCCESS ? std::optional(value) : std::nullopt;
+    }
 };
 
 JsonDocument::JsonDocument(std::unique_ptr<Parsed> parsed) : _parsed(std::move(parsed)) {}
@@ -329,6 +340,25 @@ bool JsonDocument::anyElementHas(std::string_view key) const
                dom::object object;
                return element.get(object) == simdjson::SUCCESS && !object.at_key(key).error();
            });
+}
+
+std::optional<std::string_view> JsonDocument::textOf(std::string_view key) const
+{
+    return _parsed->entry<std::string_view>(key);
+}
+
+bool JsonDocument::hasDictionary(std::string_view key) const
+{
+    return _parsed->entry<dom::object>(key).has_value();
+}
+
+void JsonDocument::eachEntryOf(std::string_view key, const std::function<bool(std::string_view)>& wanted,
+                               const std::function<void(std::string_view, Value)>& take) const
+{
+    const auto dictionary = _parsed->entry<dom::object>(key);
+    if (!dictionary) return;
+    for (const auto& [name, element] : *dictionary)
+        if (wanted(name)) take(name, convert(element));
 }
 
 Value JsonDocument::entryOfFirst(std::string_view key) const

@@ -1,7 +1,9 @@
 #pragma once
 
 #include <expected>
+#include <functional>
 #include <memory>
+#include <optional>
 #include <string_view>
 
 #include "platform/Value.h"
@@ -27,6 +29,17 @@ public:
     [[nodiscard]] bool anyElementHas(std::string_view key) const;
     /// The entry `key` of the dictionary that is the array's first element; the null value where there is none.
     [[nodiscard]] Value entryOfFirst(std::string_view key) const;
+
+    // Of a document that is a dictionary. Of duplicate keys the last counts.
+
+    /// The text that is the entry `key`, for as long as the document lives; none where it is something else.
+    [[nodiscard]] std::optional<std::string_view> textOf(std::string_view key) const;
+    /// Whether the entry `key` is a dictionary.
+    [[nodiscard]] bool hasDictionary(std::string_view key) const;
+    /// Calls `take` with each entry of the dictionary that is the entry `key` whose name is `wanted`, in their order;
+    /// of duplicate names with each. Only the values of these are made.
+    void eachEntryOf(std::string_view key, const std::function<bool(std::string_view name)>& wanted,
+                     const std::function<void(std::string_view name, Value value)>& take) const;
 
 private:
     struct Parsed;

@@ -1,10 +1,13 @@
 #include "platform/Text.h"
 
 #include <algorithm>
+#include <cstdint>
+#include <numeric>
 
 #include <unicode/brkiter.h>
 #include <unicode/bytestream.h>
 #include <unicode/casemap.h>
+#include <unicode/coleitr.h>
 #include <unicode/coll.h>
 #include <unicode/stsearch.h>
 #include <unicode/tblcoll.h>
@@ -85,12 +88,23 @@ std::string_view trimmed(std::string_view text)
     return text.substr(static_cast<std::size_t>(begin), static_cast<std::size_t>(end - begin));
 }
 
-std::vector<std::string> wordsIn(std::string_view text, const std::string& locale)
+struct WordFinder::Impl {
+    std::unique_ptr<icu::BreakIterator> iterator; // null where ICU has none
+};
+
+WordFinder::WordFinder(const std::string& locale) : _impl(std::make_unique<Impl>())
 {
     UErrorCode status = U_ZERO_ERROR;
-    const std::unique_ptr<icu::BreakIterator> iterator(
-        icu::BreakIterator::createWordInstance(localeOf(locale), status));
-    if (U_FAILURE(status)) return {};
+    _impl->iterator.reset(icu::BreakIterator::createWordInstance(localeOf(locale), status));
+}
+
+WordFinder::~WordFinder() = default;
+WordFinder::WordFinder(WordFinder&&) noexcept = default;
+
+std::vector<std::string> WordFinder::wordsIn(std::string_view text)
+{
+    icu::BreakIterator* iterator = _impl->iterator.get();
+    if (!iterator) return {};
     const icu::UnicodeString whole = unicode(text);
     iterator->setText(whole);
     std::vector<std::string> words;
@@ -101,18 +115,111 @@ std::vector<std::string> wordsIn(std::string_view text, const std::string& local
     return words;
 }
 
-struct LocalizedSearch::Impl {
-    icu::UnicodeString text;
-    std::unique_ptr<icu::Collator> collator;
+namespace {
+
+/// What a text compares as: a weight, of the characters in [begin, end). The second and later weights of a character
+/// are of no characters.
+struct Element {
+    std::uint32_t weight;
+    int32_t begin, end;
 };
 
-LocalizedSearch::LocalizedSearch(std::string_view text, const std::string& locale) : _impl(std::make_unique<Impl>())
+/// Accents count, case doesn't: the primary and secondary bits of ICU's weights.
+constexpr std::uint32_t kCounts = 0xffffff00;
+
+template <class Take> void eachElement(icu::CollationElementIterator& iterator, Take take)
 {
     UErrorCode status = U_ZERO_ERROR;
-    _impl->text = unicode(text);
-    _impl->collator.reset(icu::Collator::createInstance(localeOf(locale), status));
-    if (_impl->collator) _impl->collator->setStrength(icu::Collator::SECONDARY); // accents count, case doesn't
+    for (int32_t begin = iterator.getOffset();; begin = iterator.getOffset()) {
+        const int32_t order = iterator.next(status);
+        if (U_FAILURE(status) || order == icu::CollationElementIterator::NULLORDER) return;
+        const std::uint32_t weight = static_cast<std::uint32_t>(order) & kCounts;
+        if (weight != 0) take(Element{weight, begin, iterator.getOffset()});
+    }
 }
+
+/// Whether a user takes what is before `at` and what is behind it for different characters. False where that would need
+/// looking into: below U+0300 nothing combines.
+bool surelyBetweenCharacters(const icu::UnicodeString& text, int32_t at)
+{
+    constexpr char16_t kFirstCombining = 0x300;
+    if (at == 0 || at == text.length()) return true;
+    return text[at - 1] < kFirstCombining && text[at] < kFirstCombining && text[at] != u'\n';
+}
+
+} // namespace
+
+/// Looking for a part with ICU's search takes longer than all else that a caller does with it, as it goes through the
+/// text's weights each time. Here they are kept in an index, and ICU's search decides where it isn't clear from them.
+struct LocalizedSearch::Impl {
+    icu::UnicodeString text;
+    std::unique_ptr<icu::RuleBasedCollator> collator; // null where ICU has none
+    std::vector<Element> elements;                    // of the text
+    std::vector<std::uint32_t> places;                // in `elements`, by weight
+    std::unique_ptr<icu::CollationElementIterator> partIterator; // null where the index isn't used
+    std::vector<std::uint32_t> part;
+
+    Impl(std::string_view text_, const std::string& locale) : text(unicode(text_))
+    {
+        UErrorCode status = U_ZERO_ERROR;
+        std::unique_ptr<icu::Collator> any(icu::Collator::createInstance(localeOf(locale), status));
+        if (U_FAILURE(status) || !dynamic_cast<icu::RuleBasedCollator*>(any.get())) return;
+        collator.reset(static_cast<icu::RuleBasedCollator*>(any.release()));
+        collator->setStrength(icu::Collator::SECONDARY);
+        // Where punctuation counts for nothing, that depends on what follows it.
+        if (collator->getAttribute(UCOL_ALTERNATE_HANDLING, status) != UCOL_NON_IGNORABLE || U_FAILURE(status)) return;
+        index();
+    }
+
+    void index()
+    {
+        const std::unique_ptr<icu::CollationElementIterator> iterator(collator->createCollationElementIterator(text));
+        partIterator.reset(collator->createCollationElementIterator(icu::UnicodeString()));
+        if (!iterator || !partIterator) return partIterator.reset();
+        eachElement(*iterator, [this](const Element& element) { elements.push_back(element); });
+        places.resize(elements.size());
+        std::iota(places.begin(), places.end(), 0u);
+        std::ranges::stable_sort(places, {}, [this](std::uint32_t place) { return elements[place].weight; });
+    }
+
+    enum class Found { No, Yes, Perhaps };
+
+    Found find(const icu::UnicodeString& pattern)
+    {
+        UErrorCode status = U_ZERO_ERROR;
+        partIterator->setText(pattern, status);
+        part.clear();
+        eachElement(*partIterator, [this](const Element& element) { part.push_back(element.weight); });
+        if (U_FAILURE(status)) return Found::Perhaps;
+        if (part.empty()) return Found::No;
+        Found found = Found::No;
+        for (const std::uint32_t place :
+             std::ranges::equal_range(places, part[0], {}, [this](std::uint32_t p) { return elements[p].weight; })) {
+            if (elements.size() - place < part.size()) continue;
+            const auto begin = elements.begin() + place, end = begin + static_cast<std::ptrdiff_t>(part.size());
+            if (!std::equal(part.begin(), part.end(), begin, [](auto weight, auto& e) { return weight == e.weight; }))
+                continue;
+            const bool whole = begin->begin < begin->end && (end == elements.end() || end->begin < end->end);
+            if (whole && surelyBetweenCharacters(text, begin->begin) && surelyBetweenCharacters(text, (end - 1)->end))
+                return Found::Yes;
+            found = Found::Perhaps;
+        }
+        return found;
+    }
+
+    [[nodiscard]] bool search(const icu::UnicodeString& pattern) const
+    {
+        UErrorCode status = U_ZERO_ERROR;
+        if (collator->compare(pattern, icu::UnicodeString(), status) == UCOL_EQUAL) return false;
+        icu::StringSearch search(pattern, text, collator.get(), nullptr, status);
+        const int32_t found = search.first(status);
+        return U_SUCCESS(status) && found != USEARCH_DONE;
+    }
+};
+
+LocalizedSearch::LocalizedSearch(std::string_view text, const std::string& locale)
+    : _impl(std::make_unique<Impl>(text, locale))
+{}
 
 LocalizedSearch::~LocalizedSearch() = default;
 LocalizedSearch::LocalizedSearch(LocalizedSearch&&) noexcept = default;
@@ -120,13 +227,9 @@ LocalizedSearch::LocalizedSearch(LocalizedSearch&&) noexcept = default;
 bool LocalizedSearch::contains(std::string_view part) const
 {
     const icu::UnicodeString pattern = unicode(part);
-    auto* collator = dynamic_cast<icu::RuleBasedCollator*>(_impl->collator.get());
-    if (!collator || pattern.isEmpty() || _impl->text.isEmpty()) return false;
-    UErrorCode status = U_ZERO_ERROR;
-    if (collator->compare(pattern, icu::UnicodeString(), status) == UCOL_EQUAL) return false;
-    icu::StringSearch search(pattern, _impl->text, collator, nullptr, status);
-    const int32_t found = search.first(status);
-    return U_SUCCESS(status) && found != USEARCH_DONE;
+    if (!_impl->collator || pattern.isEmpty() || _impl->text.isEmpty()) return false;
+    const auto found = _impl->partIterator ? _impl->find(pattern) : Impl::Found::Perhaps;
+    return found == Impl::Found::Perhaps ? _impl->search(pattern) : found == Impl::Found::Yes;
 }
 
 } // namespace platform

@@ -1,11 +1,13 @@
 #include "tavrind/AppWhitelistController.h"
 
 #include <algorithm>
+#include <unordered_map>
 #include <vector>
 
 #include "CoreTavrin/TAVBag.h"
 #include "platform/Device.h"
 #include "platform/InstalledApplications.h"
+#include "platform/JsonDocument.h"
 #include "platform/UserDefaults.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/DownloadManager.h"
@@ -15,6 +17,7 @@
 
 namespace tavrin {
 
+using platform::JsonDocument;
 using platform::Value;
 
 namespace {
@@ -27,25 +30,27 @@ const platform::Log& log()
     return TavrinLogForCategory(kLogGeneral);
 }
 
-/// The list inside the resource: "version" a text, "apps" a dictionary. Null for anything else.
-Value innerList(std::string_view whitelist)
+std::optional<JsonDocument> parsed(std::string_view json)
 {
-    const auto isText = [](const Value& value, std::string_view text) {
-        return value.asString() && *value.asString() == text;
-    };
-    const auto outer = platform::parseJson(whitelist, kMaximumWhitelistSize);
-    if (!outer) log().error("app whitelist is broken: {}", outer.error().description());
-    if (!outer || !isText((*outer)["compression"], "RLE") || !isText((*outer)["encoding"], "bitmap")) return {};
-    const std::string* text = (*outer)["apps"].asString();
-    if (!text) return {};
-    auto inner = platform::parseJson(*text, kMaximumWhitelistSize);
-    if (!inner) log().error("app whitelist is broken: {}", inner.error().description());
-    if (!inner || !(*inner)["version"].asString() || !(*inner)["apps"].asDictionary()) return {};
-    return std::move(*inner);
+    auto document = JsonDocument::parse(json, kMaximumWhitelistSize);
+    if (document) return std::move(*document);
+    log().error("app whitelist is broken: {}", document.error().description());
+    return std::nullopt;
+}
+
+/// The list inside the resource: "version" a text, "apps" a dictionary. None for anything else.
+std::optional<JsonDocument> innerList(std::string_view whitelist)
+{
+    const auto outer = parsed(whitelist);
+    if (!outer || outer->textOf("compression") != "RLE" || outer->textOf("encoding") != "bitmap") return std::nullopt;
+    const auto text = outer->textOf("apps");
+    auto inner = text ? parsed(*text) : std::nullopt;
+    if (!inner || !inner->textOf("version") || !inner->hasDictionary("apps")) return std::nullopt;
+    return inner;
 }
 
 /// The number of an application, from its entries in the list: the last counts.
-std::optional<std::uint32_t> encodingId(const std::string& identifier, const Value& entries)
+std::optional<std::uint32_t> encodingId(std::string_view identifier, const Value& entries)
 {
     if (entries.count() == 0 || !entries.asArray()) return std::nullopt;
     const Value& number = entries[entries.count() - 1]["encoding_id"];
@@ -63,20 +68,27 @@ std::optional<std::uint32_t> encodingId(const std::string& identifier, const Val
 
 std::optional<std::string> processWhitelist(std::string_view whitelist, platform::InstalledApplications& installed)
 {
-    const Value list = innerList(whitelist);
-    if (list.isNull()) return std::nullopt;
+    const auto list = innerList(whitelist);
+    if (!list) return std::nullopt;
+    const std::vector<platform::InstalledApplication> applications = installed.applications();
+    std::unordered_map<std::string_view, std::optional<std::uint32_t>> found; // of what is installed, what is listed
+    found.reserve(applications.size());
+    for (const platform::InstalledApplication& application : applications)
+        if (!application.identifier.empty() && !application.version.empty()) found.try_emplace(application.identifier);
+    list->eachEntryOf(
+        "apps", [&](std::string_view identifier) { return found.contains(identifier); },
+        [&](std::string_view identifier, const Value& entries) {
+            found.find(identifier)->second = encodingId(identifier, entries);
+        });
     std::vector<std::uint32_t> ids;
-    for (const platform::InstalledApplication& application : installed.applications()) {
-        if (application.identifier.empty() || application.version.empty()) continue;
-        if (const auto id = encodingId(application.identifier, list["apps"][application.identifier]))
-            ids.push_back(*id);
-    }
+    for (const auto& [identifier, id] : found)
+        if (id) ids.push_back(*id);
     if (ids.empty()) return std::nullopt;
     std::ranges::sort(ids);
     const std::string bitmap = bitmapOf(ids);
-    auto signature =
-        makeSignature(static_cast<std::uint16_t>(bitmap.size()), rle_compress(bitmap), *list["version"].asString());
-    if (!signature) log().error("app whitelist version is not hexadecimal: {}", *list["version"].asString());
+    const std::string_view version = *list->textOf("version");
+    auto signature = makeSignature(static_cast<std::uint16_t>(bitmap.size()), rle_compress(bitmap), version);
+    if (!signature) log().error("app whitelist version is not hexadecimal: {}", version);
     return signature;
 }
 

@@ -1,7 +1,8 @@
 #include "tavrind/Lookup.h"
 
 #include <algorithm>
-#include <set>
+#include <map>
+#include <string_view>
 #include <vector>
 
 #include "CoreTavrin/TAVBag.h"
@@ -50,47 +51,50 @@ float numberIn(const Value& value)
     return static_cast<float>(value.asDouble().value_or(0));
 }
 
-std::string textIn(const Value& value)
-{
-    return value.asString() ? *value.asString() : std::string();
-}
-
 /// The weights of those keywords that the text has, each once; of a word that comes twice the last weight counts.
 float keywordScore(const Value& keywords, const platform::LocalizedSearch& context)
 {
-    Dictionary weights;
+    std::map<std::string_view, float> weights;
     if (const Value::Array* array = keywords.asArray())
         for (const Value& keyword : *array)
-            if (keyword["word"].asString()) weights.set(*keyword["word"].asString(), keyword["weight"]);
+            if (const std::string* word = keyword["word"].asString())
+                weights.insert_or_assign(*word, numberIn(keyword["weight"]));
     float score = 0;
     for (const auto& [word, weight] : weights)
-        if (context.contains(word)) score += numberIn(weight);
+        if (context.contains(word)) score += weight;
     return score;
 }
 
-/// Of the words of two texts, how many of all are in both.
+/// Each word once, in their order.
+std::vector<std::string> distinct(std::vector<std::string> words)
+{
+    std::ranges::sort(words);
+    const auto rest = std::ranges::unique(words);
+    words.erase(rest.begin(), rest.end());
+    return words;
+}
+
+/// Of the distinct words of two texts, how many of all are in both.
 float jaccardIndex(const std::vector<std::string>& a, const std::vector<std::string>& b)
 {
-    const std::set<std::string_view> first(a.begin(), a.end());
-    std::set<std::string_view> all = first;
-    std::size_t shared = 0;
-    for (const std::string_view word : std::set<std::string_view>(b.begin(), b.end()))
-        if (!all.insert(word).second) ++shared;
-    return all.empty() ? 0 : static_cast<float>(shared) / static_cast<float>(all.size());
+    const auto shared = std::ranges::count_if(b, [&](auto& word) { return std::ranges::binary_search(a, word); });
+    const std::size_t all = a.size() + b.size() - static_cast<std::size_t>(shared);
+    return all == 0 ? 0 : static_cast<float>(shared) / static_cast<float>(all);
 }
 
 /// What results are measured against: the text around the word that is looked up.
-struct LookupContext {
-    platform::LocalizedSearch search;
-    std::vector<std::string> words;
-    std::string locale;
+class LookupContext {
+public:
+    LookupContext(std::string_view text, const std::string& locale)
+        : _search(text, locale), _finder(locale), _words(distinct(_finder.wordsIn(text)))
+    {}
 
-    [[nodiscard]] bool keeps(const Value& instructions) const
+    [[nodiscard]] bool keeps(const Value& instructions)
     {
-        const float score = keywordScore(instructions["keywords"], search);
+        const float score = keywordScore(instructions["keywords"], _search);
         const float minimum = numberIn(instructions["min_keywords_score"]);
-        const std::string completion = textIn(instructions["completion"]);
-        const bool completes = completion.empty() || search.contains(completion);
+        const std::string* completion = instructions["completion"].asString();
+        const bool completes = !completion || completion->empty() || _search.contains(*completion);
         if (score < minimum || !completes) {
             log().debug("dropping lookup result. keyword score: {:f} min keyword score: {:f} completion exists: {:d}",
                         score, minimum, completes);
@@ -98,14 +102,20 @@ struct LookupContext {
         }
         const float subjectMinimum = numberIn(instructions["min_subject_score"]);
         if (subjectMinimum == 0) return true;
-        const std::string subject = textIn(instructions["subject"]);
-        const float index = subject.empty() ? 0 : jaccardIndex(words, platform::wordsIn(subject, locale));
+        const std::string* subject = instructions["subject"].asString();
+        const float index =
+            !subject || subject->empty() ? 0 : jaccardIndex(_words, distinct(_finder.wordsIn(*subject)));
         if (subjectMinimum > index) {
             log().debug("dropping lookup result. jaccard index: {:f} min subject score: {:f}", index, subjectMinimum);
             return false;
         }
         return true;
     }
+
+private:
+    platform::LocalizedSearch _search;
+    platform::WordFinder _finder;
+    std::vector<std::string> _words; // distinct
 };
 
 } // namespace
@@ -117,8 +127,7 @@ void Lookup::filterLookupResultsWithRequest(const TAVLookupRequest& request, Val
     if (response.count() == 0)
         return log().error("no data to process for lookup response. request: {} response: {}", request.queryString,
                            shortened(response));
-    const std::string text = request.queryContext.value_or("");
-    const LookupContext context{platform::LocalizedSearch(text, locale), platform::wordsIn(text, locale), locale};
+    LookupContext context(request.queryContext.value_or(""), locale);
     for (Value& resultSet : response.mutableArray()) {
         const Value::Array* results = resultSet["results"].asArray();
         if (!results) continue;

@@ -1,6 +1,8 @@
 #include "tavrind/encoder.h"
 
+#include <algorithm>
 #include <array>
+#include <bit>
 #include <charconv>
 
 #include <openssl/evp.h>
@@ -47,6 +49,24 @@ private:
     std::string _values;
 };
 
+bool bitAt(std::string_view bitmap, std::size_t bit)
+{
+    return (static_cast<unsigned char>(bitmap[bit / 8]) & 0x80u >> bit % 8) != 0;
+}
+
+/// How many bits from `bit` on have this value; a longest run at most.
+std::size_t runFrom(std::string_view bitmap, std::size_t bit, bool value)
+{
+    const std::size_t last = std::min(bit + kLongestRun, bitmap.size() * 8);
+    for (std::size_t at = bit; at < last; at = at / 8 * 8 + 8) {
+        // What differs from the value, from this bit of its byte on.
+        const auto differing = static_cast<unsigned char>((bitmap[at / 8] ^ (value ? 0xff : 0)) & 0xff >> at % 8);
+        if (differing != 0)
+            return std::min(at / 8 * 8 + static_cast<std::size_t>(std::countl_zero(differing)), last) - bit;
+    }
+    return last - bit;
+}
+
 /// The last two bytes of a version in hexadecimal, as one number.
 std::optional<unsigned> versionTail(std::string_view version)
 {
@@ -85,21 +105,13 @@ std::string bitmapOf(std::span<const std::uint32_t> ids)
 RunLengthCoding encodeRun(std::string_view bitmap)
 {
     Runs runs;
-    std::size_t length = 0;
-    bool value = false;
-    for (const char byte : bitmap) {
-        for (unsigned mask = 0x80; mask != 0; mask >>= 1) {
-            const bool bit = (static_cast<unsigned char>(byte) & mask) != 0;
-            if (length > 0 && (bit != value || length == kLongestRun)) {
-                runs.saveRun(length, value);
-                length = 0;
-                if (runs.codedSize() >= bitmap.size()) return {std::string(bitmap), false};
-            }
-            value = bit;
-            ++length;
-        }
+    for (std::size_t bit = 0; bit < bitmap.size() * 8;) {
+        const bool value = bitAt(bitmap, bit);
+        const std::size_t length = runFrom(bitmap, bit, value);
+        runs.saveRun(length, value);
+        bit += length;
+        if (runs.codedSize() >= bitmap.size()) return {std::string(bitmap), false};
     }
-    if (length > 0) runs.saveRun(length, value);
     if (runs.codedSize() >= bitmap.size()) return {std::string(bitmap), false};
     return {runs.coded(), true};
 }

@@ -74,6 +74,7 @@ TEST(AppSignature, CodesRunsOnlyWhereThatIsShorter)
         {std::string(4, '\0'), false, std::string(4, '\0')}, // one run: 4 bytes, which is not shorter
         {std::string(5, '\0'), true, std::string("\0\1\x27\0", 4)},
         {mixed, true, std::string("\0\3\xff\x2b\3\xc0", 6)}, // 300 ones: 256 and 44
+        {"\1" + std::string(33, '\0') + "\1\xff", true, std::string("\0\5\6\0\xff\x0e\x08\x48", 8)},
         {std::string(64, '\xff'), true, std::string("\0\2\xff\xff\xc0", 5)},
     };
     for (const auto& c : cases) {
@@ -156,7 +157,10 @@ TEST(AppWhitelist, GivesNoSignatureForWhatIsNoListOrNamesNothingInstalled)
         R"({"version": "0a1b2c", "apps": {"one": [{"encoding_id": 1}], "many": [{"encoding_id": 9}, 5,
         {"encoding_id": 3}], "eight": [{"encoding_id": 8}], "zero": [{"encoding_id": 0}], "huge": [{"encoding_id": 524280}],
         "half": [{"encoding_id": 1.5}], "minus": [{"encoding_id": -1}], "text": [{"encoding_id": "2"}], "none": [],
-        "last": [{"encoding_id": 2}, 7], "object": {"encoding_id": 2}, "yes": [{"encoding_id": true}]}})";
+        "last": [{"encoding_id": 2}, 7], "object": {"encoding_id": 2}, "yes": [{"encoding_id": true}],
+        "again": [{"encoding_id": 6}], "twin": [{"encoding_id": 1}], "again": [{"encoding_id": 3}],
+        "gone": [{"encoding_id": 2}], "gone": [{"encoding_id": -5}], "giant": [{"encoding_id": 18446744073709551615}],
+        "whole": [{"encoding_id": 3.0}]}})";
     using Names = std::vector<std::string>;
     const struct {
         std::string list;
@@ -167,6 +171,8 @@ TEST(AppWhitelist, GivesNoSignatureForWhatIsNoListOrNamesNothingInstalled)
         {listOf(sound), {"one", "eight"}, "\x40"},
         {listOf(sound), {"zero"}, ""},
         {listOf(sound), {"one", "huge", "half", "minus", "text", "none", "last", "object", "yes"}, "\x40"},
+        {listOf(sound), {"one", "twin", "again", "gone", "giant"}, "\x50"}, // of a name that comes twice the last counts
+        {listOf(sound), {"one", "whole"}, "\x50"},
         {listOf(sound), {"other"}, {}},
         {listOf(sound), {}, {}},
         {listOf(sound, "LZ"), {"one"}, {}},
@@ -187,7 +193,19 @@ TEST(AppWhitelist, GivesNoSignatureForWhatIsNoListOrNamesNothingInstalled)
         const auto signature = processWhitelist(c.list, device.applications);
         EXPECT_EQ(signature ? std::optional(readSignature(*signature)->bitmap) : std::nullopt, c.bitmap) << c.list;
     }
+    const std::string whole = listOf(sound);
+    for (std::size_t length = 0; length < whole.size(); ++length)
+        EXPECT_FALSE(processWhitelist(whole.substr(0, length), device.applications)) << "cut at " << length;
+    const std::string inner(sound);
+    for (std::size_t length = 0; length < inner.size(); ++length)
+        EXPECT_FALSE(processWhitelist(listOf(inner.substr(0, length)), device.applications)) << "cut at " << length;
+
+    const platform::FileHandle huge(memfd_create("list", MFD_CLOEXEC));
+    ASSERT_EQ(ftruncate(huge.fd(), off_t{1} << 30), 0);
     device.applications.readings = 0;
+    const platform::test::LogCapture log;
+    EXPECT_FALSE(processWhitelist(mmapFileHandle(huge)->view(), device.applications));
+    EXPECT_EQ(log.count("app whitelist is broken: larger than 33554432 bytes"), 1);
     EXPECT_FALSE(processWhitelist("{}", device.applications));
     EXPECT_EQ(device.applications.readings, 0) << "for nothing";
 }

@@ -126,6 +126,30 @@ TEST(Json, DocumentsAnswerFromTheirPlace)
     }
 }
 
+TEST(Json, DocumentsThatAreDictionariesMakeOnlyTheValuesThatAreWanted)
+{
+    const auto document = JsonDocument::parse(
+        R"({"t":"\u00fc","n":1,"d":{"x":1},"t":"last","d":{"a":[1],"b":2,"a":{"c":3},"":null},"l":["d"]})");
+    ASSERT_TRUE(document);
+    EXPECT_EQ(document->textOf("t"), "last");
+    for (const char* none : {"n", "d", "x", ""}) EXPECT_FALSE(document->textOf(none)) << none;
+    EXPECT_TRUE(document->hasDictionary("d"));
+    for (const char* none : {"t", "l", "a", ""}) EXPECT_FALSE(document->hasDictionary(none)) << none;
+
+    std::vector<std::string> asked, taken;
+    const auto each = [&](const JsonDocument& in, const char* key) {
+        in.eachEntryOf(
+            key, [&](std::string_view name) { return asked.emplace_back(name) != "b"; },
+            [&](std::string_view name, const Value& value) { taken.push_back(std::string(name) + toJson(value)); });
+    };
+    each(*document, "d");
+    EXPECT_EQ(asked, (std::vector<std::string>{"a", "b", "a", ""}));
+    EXPECT_EQ(taken, (std::vector<std::string>{"a[1]", "a{\"c\":3}", "null"}));
+    each(*document, "l");
+    each(*JsonDocument::parse(R"([{"d":{"a":1}}])"), "d");
+    EXPECT_EQ(taken.size(), 3u);
+}
+
 TEST(Json, KeepsNothingOfALargeDocumentForTheNextOne)
 {
     const Value large = Value::Array(100'000, Value("some text"));
