@@ -128,12 +128,14 @@ std::vector<Row> signature()
             worst = bitmap;
         }
     }
+    std::vector<double> times;
     Row row = compare(
-        "run-length coding of the worst bitmap of 65,535 bytes, beside memcpy", 21, 0, [&] { return codings(worst); },
-        [&] { return copies(worst); });
-    rows.push_back({"the same, in milliseconds", row.ours, "", codings(worst) * 1000, 1, "ms"});
-    row.limit = row.figure; // reported, and limited by the next line
-    rows.insert(rows.end() - 1, std::move(row));
+        "run-length coding of the worst bitmap of 65,535 bytes, beside memcpy", 21, 0,
+        [&] { return times.emplace_back(codings(worst)); }, [&] { return copies(worst); });
+    row.figure = median(times) * 1000; // the time is limited, and not the ratio
+    row.limit = 1;
+    row.unit = "ms";
+    rows.push_back(std::move(row));
     return rows;
 }
 

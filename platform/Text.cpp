@@ -153,9 +153,9 @@ bool surelyBetweenCharacters(const icu::UnicodeString& text, int32_t at)
 /// text's weights each time. Here they are kept in an index, and ICU's search decides where it isn't clear from them.
 struct LocalizedSearch::Impl {
     icu::UnicodeString text;
-    std::unique_ptr<icu::RuleBasedCollator> collator; // null where ICU has none
-    std::vector<Element> elements;                    // of the text
-    std::vector<std::uint32_t> places;                // in `elements`, by weight
+    std::unique_ptr<icu::RuleBasedCollator> collator;            // null where ICU has none
+    std::vector<Element> elements;                               // of the text
+    std::vector<std::uint32_t> places;                           // in `elements`, by weight
     std::unique_ptr<icu::CollationElementIterator> partIterator; // null where the index isn't used
     std::vector<std::uint32_t> part;
 

@@ -171,7 +171,9 @@ TEST(AppWhitelist, GivesNoSignatureForWhatIsNoListOrNamesNothingInstalled)
         {listOf(sound), {"one", "eight"}, "\x40"},
         {listOf(sound), {"zero"}, ""},
         {listOf(sound), {"one", "huge", "half", "minus", "text", "none", "last", "object", "yes"}, "\x40"},
-        {listOf(sound), {"one", "twin", "again", "gone", "giant"}, "\x50"}, // of a name that comes twice the last counts
+        {listOf(sound),
+         {"one", "twin", "again", "gone", "giant"},
+         "\x50"}, // of a name that comes twice the last counts
         {listOf(sound), {"one", "whole"}, "\x50"},
         {listOf(sound), {"other"}, {}},
         {listOf(sound), {}, {}},

@@ -363,6 +363,7 @@ TEST_F(DownloadManagerTest, TheDelayCanBeShortenedForDevelopment)
         device.advance(59s);
         EXPECT_TRUE(tasks().empty()) << platform::toJson(wrong);
         bag({});
+        device.advance(1s);
     }
     device.userDefaults.set("TAVDownloadDelay", 2);
     bag({{"TAVQIFeatures", "https://r.example/f"}});
