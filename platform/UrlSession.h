@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstdint>
+#include <filesystem>
 #include <functional>
 #include <map>
 #include <memory>
@@ -18,6 +19,8 @@
 
 namespace platform {
 
+class Clock;
+class HttpCache;
 class Queue;
 
 /// Header fields in the order in which they stand. Names compare without regard to case (RFC 9110).
@@ -114,8 +117,8 @@ class UrlSession {
 public:
     /// data: the body, none with a transport error. response: none where none came. error: a transport error; an HTTP
     /// error status is none.
-    using DataCompletion =
-        std::move_only_function<void(std::optional<Bytes> data, std::optional<UrlResponse> response, std::optional<Error> error)>;
+    using DataCompletion = std::move_only_function<void(std::optional<Bytes> data, std::optional<UrlResponse> response,
+                                                        std::optional<Error> error)>;
 
     virtual ~UrlSession() = default;
     /// `completion` runs on the session's delegate queue.
@@ -124,6 +127,18 @@ public:
     /// that can't be read or written is an error of the load, in kPosixErrorDomain.
     [[nodiscard]] virtual std::shared_ptr<UrlTask> transferTask(UrlRequest request, TransferFiles files,
                                                                 DataCompletion completion) = 0;
+    /// What the session keeps of its answers; null where it keeps none.
+    [[nodiscard]] virtual std::shared_ptr<HttpCache> cache() const { return nullptr; }
+};
+
+/// What a session may keep of its answers, and where.
+struct HttpCacheConfiguration {
+    std::size_t memoryCapacity = 1u << 20;   ///< bytes
+    std::uint64_t diskCapacity = 100u << 20; ///< bytes
+    std::size_t minimumMappedSize = 16384;   ///< bodies of so many bytes are files of their own, mapped when read
+    std::filesystem::path directory;         ///< made with the first need; empty: nothing is kept on disk
+    std::shared_ptr<Queue> queue;            ///< a serial one for the disk's work; none without a directory
+    Clock* clock = nullptr;                  ///< outlives the cache
 };
 
 /// How a session loads.
@@ -140,6 +155,8 @@ struct UrlSessionConfiguration {
     unsigned maximumRedirects = 16;
     /// A PEM file of certification authorities in place of the system's; empty is the system's.
     std::string caFile;
+    /// What is kept of answers to data tasks; none is nothing.
+    std::optional<HttpCacheConfiguration> cache;
 };
 
 /// Makes sessions. One for the process; a twin in tests/support answers by hand. Any thread.

@@ -4,6 +4,7 @@
 #include <string>
 #include <vector>
 
+#include "platform/HttpCache.h"
 #include "platform/Queue.h"
 #include "platform/UrlSession.h"
 
@@ -57,6 +58,10 @@ public:
         Session(UrlSessionConfiguration configuration_, std::shared_ptr<Queue> queue)
             : configuration(std::move(configuration_)), _queue(std::move(queue))
         {
+            if (!configuration.cache) return;
+            HttpCacheConfiguration inMemory = *configuration.cache;
+            inMemory.directory.clear();
+            _cache = HttpCache::make(std::move(inMemory));
         }
         std::shared_ptr<UrlTask> dataTask(UrlRequest request, DataCompletion completion) override
         {
@@ -69,11 +74,14 @@ public:
             tasks.back()->files = std::move(files);
             return task;
         }
+        /// In memory only. Its tasks neither ask nor fill it.
+        [[nodiscard]] std::shared_ptr<HttpCache> cache() const override { return _cache; }
         UrlSessionConfiguration configuration;
         std::vector<std::shared_ptr<Task>> tasks;
 
     private:
         std::shared_ptr<Queue> _queue;
+        std::shared_ptr<HttpCache> _cache;
     };
 
     std::shared_ptr<UrlSession> makeSession(UrlSessionConfiguration configuration, std::shared_ptr<Queue> queue) override
