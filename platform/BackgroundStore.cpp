@@ -7,7 +7,6 @@
 #include <fcntl.h>
 #include <set>
 #include <stdlib.h>
-#include <sys/file.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -22,7 +21,6 @@ namespace fs = std::filesystem;
 namespace {
 
 constexpr const char* kDatabase = "transfers.db";
-constexpr const char* kLock = "lock";
 constexpr std::string_view kBodySuffix = ".body";
 constexpr std::string_view kDownloadSuffix = ".download";
 constexpr std::string_view kTemporaryPrefix = "background-transfers-";
@@ -217,25 +215,6 @@ std::vector<std::string> namesIn(const fs::path& directory)
     return makeSystemFiles()->list(directory).value_or(std::vector<std::string>());
 }
 
-struct Opened {
-    FileHandle directory;
-    FileHandle lock;
-};
-
-/// The directory, which must be ours alone, and its lock.
-Result<Opened> openLocked(const fs::path& directory)
-{
-    Opened opened{FileHandle(open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC)), {}};
-    struct stat status {};
-    if (!opened.directory || fstat(opened.directory.fd(), &status) != 0) return failure(directory);
-    if (status.st_uid != geteuid()) return std::unexpected(Error::posix(EPERM, directory.string()));
-    if ((status.st_mode & 0077) != 0 && fchmod(opened.directory.fd(), 0700) != 0) return failure(directory);
-    opened.lock =
-        FileHandle(openat(opened.directory.fd(), kLock, O_RDWR | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, 0600));
-    if (!opened.lock || flock(opened.lock.fd(), LOCK_EX | LOCK_NB) != 0) return failure(directory / kLock);
-    return opened;
-}
-
 void removeDatabase(const fs::path& directory)
 {
     for (const char* suffix : {"", "-wal", "-journal", "-shm"})
@@ -254,10 +233,10 @@ Result<std::unique_ptr<BackgroundStore>> BackgroundStore::open(const fs::path& d
 {
     if (auto made = makeSystemFiles()->createDirectories(directory); !made)
         return std::unexpected(std::move(made.error()));
-    auto opened = openLocked(directory);
+    auto opened = LockedDirectory::open(directory);
     if (!opened) return std::unexpected(std::move(opened.error()));
     std::unique_ptr<BackgroundStore> store(
-        new BackgroundStore(directory, std::move(opened->directory), std::move(opened->lock)));
+        new BackgroundStore(directory, std::move(*opened)));
     auto database = store->openDatabase();
     if (!database && Sqlite::isDamage(database.error())) {
         defaultLog().error("background transfers {} are damaged and begun anew: {}", directory.string(),
@@ -276,7 +255,7 @@ Result<std::unique_ptr<BackgroundStore>> BackgroundStore::openTemporary(const fs
     std::error_code ignored;
     for (const std::string& entry : namesIn(parent)) {
         if (!entry.starts_with(kTemporaryPrefix)) continue;
-        if (const auto unused = openLocked(parent / entry)) fs::remove_all(parent / entry, ignored);
+        if (const auto unused = LockedDirectory::open(parent / entry)) fs::remove_all(parent / entry, ignored);
     }
     std::string name = (parent / (std::string(kTemporaryPrefix) + "XXXXXX")).string();
     if (!mkdtemp(name.data())) return failure(parent);
@@ -380,7 +359,7 @@ Result<void> BackgroundStore::add(StoredTask& task, const FileHandle* body, std:
         if (!file) return std::unexpected(std::move(file.error()));
         const auto size = copy(*body, *file, maximumBody);
         if (!size) return std::unexpected(size.error());
-        if (!_temporary && (fsync(file->fd()) != 0 || fsync(_handle.fd()) != 0)) return failure(_directory);
+        if (!_temporary && (fsync(file->fd()) != 0 || fsync(_lock.directory.fd()) != 0)) return failure(_directory);
         added.bodySize = *size;
         return _database->run("UPDATE task SET bodySize = ? WHERE identifier = ?",
                               {static_cast<std::int64_t>(added.bodySize), static_cast<std::int64_t>(added.identifier)});
@@ -463,7 +442,7 @@ Result<void> BackgroundStore::syncDownload(std::uint64_t identifier) const
     if (_temporary) return {};
     const fs::path path = downloadPath(identifier);
     const FileHandle file(::open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
-    if (!file || fsync(file.fd()) != 0 || fsync(_handle.fd()) != 0) return failure(path);
+    if (!file || fsync(file.fd()) != 0 || fsync(_lock.directory.fd()) != 0) return failure(path);
     return {};
 }
 

@@ -78,8 +78,8 @@ public:
     [[nodiscard]] Result<void> syncDownload(std::uint64_t identifier) const;
 
 private:
-    BackgroundStore(std::filesystem::path directory, FileHandle handle, FileHandle lock)
-        : _directory(std::move(directory)), _handle(std::move(handle)), _lock(std::move(lock))
+    BackgroundStore(std::filesystem::path directory, LockedDirectory lock)
+        : _directory(std::move(directory)), _lock(std::move(lock))
     {}
     [[nodiscard]] Result<void> openDatabase();
     [[nodiscard]] Result<void> checkDatabase();
@@ -89,8 +89,7 @@ private:
     void sweep(const std::vector<StoredTask>& tasks) const;
 
     std::filesystem::path _directory;
-    FileHandle _handle; // the directory's
-    FileHandle _lock;
+    LockedDirectory _lock;
     std::optional<Sqlite> _database;
     Contents _contents;
     bool _temporary = false;

@@ -15,7 +15,9 @@
 #include <fmt/format.h>
 #include <openssl/ssl.h>
 
+#include "platform/CachingSession.h"
 #include "platform/CurlSupport.h"
+#include "platform/HttpCache.h"
 #include "platform/Queue.h"
 #include "platform/ThreadName.h"
 #include "platform/UrlSession.h"
@@ -587,7 +589,10 @@ public:
     std::shared_ptr<UrlSession> makeSession(UrlSessionConfiguration configuration,
                                             std::shared_ptr<Queue> delegateQueue) override
     {
-        return std::make_shared<CurlSession>(_loader, std::move(configuration), std::move(delegateQueue));
+        const auto kept = std::exchange(configuration.cache, std::nullopt);
+        auto session = std::make_shared<CurlSession>(_loader, std::move(configuration), delegateQueue);
+        if (!kept) return session;
+        return makeCachingSession(std::move(session), HttpCache::make(*kept), std::move(delegateQueue));
     }
 
 private:

@@ -8,6 +8,7 @@
 #include <fcntl.h>
 #include <pwd.h>
 #include <span>
+#include <sys/file.h>
 #include <sys/stat.h>
 #include <sys/uio.h>
 #include <unistd.h>
@@ -289,6 +290,21 @@ fs::path home()
 }
 
 } // namespace
+
+Result<LockedDirectory> LockedDirectory::open(const fs::path& path)
+{
+    const auto failure = [](const fs::path& what) { return std::unexpected(Error::posix(errno, what.string())); };
+    LockedDirectory opened{FileHandle(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC)), {}};
+    struct stat status {};
+    if (!opened.directory || fstat(opened.directory.fd(), &status) != 0) return failure(path);
+    if (status.st_uid != geteuid()) return std::unexpected(Error::posix(EPERM, path.string()));
+    if ((status.st_mode & 0077) != 0 && fchmod(opened.directory.fd(), 0700) != 0) return failure(path);
+    constexpr const char* kLock = "lock";
+    opened.lock =
+        FileHandle(openat(opened.directory.fd(), kLock, O_RDWR | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, 0600));
+    if (!opened.lock || flock(opened.lock.fd(), LOCK_EX | LOCK_NB) != 0) return failure(path / kLock);
+    return opened;
+}
 
 Result<FileInfo> fileInfo(const FileHandle& file)
 {

@@ -87,6 +87,16 @@ public:
 /// About an open file. Any thread.
 [[nodiscard]] Result<FileInfo> fileInfo(const FileHandle& file);
 
+/// A directory of one process's own: mode 0700, with a file "lock" that is locked as long as this lives. It and the lock
+/// must not be links.
+struct LockedDirectory {
+    FileHandle directory;
+    FileHandle lock;
+
+    /// An error where it isn't there, isn't ours, or another process has it (EWOULDBLOCK).
+    [[nodiscard]] static Result<LockedDirectory> open(const std::filesystem::path& path);
+};
+
 /// The user's directories. Made on first use by whoever writes there, never at start-up.
 struct Directories {
     std::filesystem::path caches;  ///< $XDG_CACHE_HOME, else ~/.cache

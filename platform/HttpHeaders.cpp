@@ -22,6 +22,14 @@ const std::string* HttpHeaders::find(std::string_view name) const
     return found == _entries.end() ? nullptr : &found->second;
 }
 
+std::string HttpHeaders::list(std::string_view name) const
+{
+    std::string all;
+    for (const Entry& entry : _entries)
+        if (named(name)(entry)) all += (all.empty() ? "" : ", ") + entry.second;
+    return all;
+}
+
 void HttpHeaders::set(std::string name, std::string value)
 {
     remove(name);

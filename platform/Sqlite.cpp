@@ -13,17 +13,14 @@ namespace platform {
 
 static_assert(Sqlite::kCorrupt == SQLITE_CORRUPT);
 
-namespace {
-
-struct Finalize {
-    void operator()(sqlite3_stmt* statement) const { sqlite3_finalize(statement); }
-};
-
-} // namespace
-
 void Sqlite::Close::operator()(sqlite3* database) const
 {
-    sqlite3_close(database);
+    sqlite3_close_v2(database); // once its statements are gone too
+}
+
+void Sqlite::Finalize::operator()(sqlite3_stmt* statement) const
+{
+    sqlite3_finalize(statement);
 }
 
 std::unexpected<Error> Sqlite::failure() const
@@ -76,11 +73,9 @@ Result<void> Sqlite::execute(const char* statements)
 Result<void> Sqlite::run(std::string_view statement, std::initializer_list<Parameter> parameters,
                          const std::function<void(const Row&)>& each)
 {
-    sqlite3_stmt* made = nullptr;
-    if (sqlite3_prepare_v2(_database.get(), statement.data(), static_cast<int>(statement.size()), &made, nullptr) !=
-        SQLITE_OK)
-        return failure();
-    const std::unique_ptr<sqlite3_stmt, Finalize> owner(made);
+    Statements::node_type taken = takeStatement(statement);
+    if (!taken) return failure();
+    sqlite3_stmt* const made = taken.mapped().get();
     int position = 0;
     for (const Parameter& parameter : parameters) {
         ++position;
@@ -97,7 +92,24 @@ Result<void> Sqlite::run(std::string_view statement, std::initializer_list<Param
     while ((stepped = sqlite3_step(made)) == SQLITE_ROW)
         if (each) each(Row(made));
     if (stepped != SQLITE_DONE) return failure();
+    sqlite3_reset(made);
+    sqlite3_clear_bindings(made);
+    _statements.insert(std::move(taken));
     return {};
+}
+
+/// Out of the kept ones, for a callback may run the same statement; an empty handle for a text that is none.
+Sqlite::Statements::node_type Sqlite::takeStatement(std::string_view text)
+{
+    auto found = _statements.find(text);
+    if (found == _statements.end()) {
+        sqlite3_stmt* made = nullptr;
+        if (sqlite3_prepare_v3(_database.get(), text.data(), static_cast<int>(text.size()), SQLITE_PREPARE_PERSISTENT,
+                               &made, nullptr) != SQLITE_OK)
+            return {};
+        found = _statements.emplace(text, std::unique_ptr<sqlite3_stmt, Finalize>(made)).first;
+    }
+    return _statements.extract(found);
 }
 
 Result<void> Sqlite::transaction(const std::function<Result<void>()>& work)

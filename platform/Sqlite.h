@@ -4,6 +4,7 @@
 #include <filesystem>
 #include <functional>
 #include <initializer_list>
+#include <map>
 #include <memory>
 #include <optional>
 #include <string>
@@ -45,7 +46,8 @@ public:
 
     /// Runs statements without parameters and results.
     [[nodiscard]] Result<void> execute(const char* statements);
-    /// Runs one statement; `each` is called with every row.
+    /// Runs one statement; `each` is called with every row. It is kept, compiled, for the next time: let it be one of a
+    /// few texts, and its values parameters.
     [[nodiscard]] Result<void> run(std::string_view statement, std::initializer_list<Parameter> parameters = {},
                                    const std::function<void(const Row&)>& each = {});
     /// Runs `work` in a transaction, which a failure of either undoes.
@@ -60,10 +62,16 @@ private:
     struct Close {
         void operator()(sqlite3* database) const;
     };
+    struct Finalize {
+        void operator()(sqlite3_stmt* statement) const;
+    };
+    using Statements = std::map<std::string, std::unique_ptr<sqlite3_stmt, Finalize>, std::less<>>;
     explicit Sqlite(sqlite3* database) : _database(database) {}
     [[nodiscard]] std::unexpected<Error> failure() const;
+    [[nodiscard]] Statements::node_type takeStatement(std::string_view text);
 
     std::unique_ptr<sqlite3, Close> _database;
+    Statements _statements; // without those that run
 };
 
 } // namespace platform

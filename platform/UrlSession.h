@@ -33,6 +33,8 @@ public:
 
     /// The first field of that name.
     [[nodiscard]] const std::string* find(std::string_view name) const;
+    /// The values of all fields of that name, with commas between them: one list (RFC 9110, 5.3).
+    [[nodiscard]] std::string list(std::string_view name) const;
     /// Sets a field in place of every one of that name.
     void set(std::string name, std::string value);
     /// Adds a field beside those that are there.
