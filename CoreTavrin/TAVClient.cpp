@@ -107,17 +107,18 @@ void TAVConnection::send(std::string_view member, std::vector<Value> arguments,
                   });
 }
 
-Result<ipc::Message> TAVConnection::call(std::string_view member, std::vector<Value> arguments)
+Result<ipc::Message> TAVConnection::call(std::string_view member, std::vector<Value> arguments, platform::Duration more)
 {
+    const platform::Duration timeout = _timeout + more;
     // Shared with the handler, which outlives this call where the time is up first.
     auto answer = std::make_shared<std::optional<Result<ipc::Message>>>();
     send(member, std::move(arguments), [answer](Result<ipc::Message> result) { *answer = std::move(result); });
-    if (wait([&] { return answer->has_value(); }, _timeout)) return std::move(**answer);
+    if (wait([&] { return answer->has_value(); }, timeout)) return std::move(**answer);
     if (!connected())
         return std::unexpected(
             clientError(ECONNRESET, fmt::format("the daemon closed the connection during {}", member)));
     return std::unexpected(
-        clientError(ETIMEDOUT, fmt::format("no answer to {} within {:g} s", member, platform::toSeconds(_timeout))));
+        clientError(ETIMEDOUT, fmt::format("no answer to {} within {:g} s", member, platform::toSeconds(timeout))));
 }
 
 void TAVConnection::sendRequest(std::vector<Value> arguments, AnswerHandler handler)
@@ -141,6 +142,19 @@ Result<std::unique_ptr<TAVEndpointClient>> TAVEndpointClient::connect(const std:
 Result<TAVAnswer> TAVEndpointClient::request(const TAVRequest& request, const TAVSessionConfiguration& configuration)
 {
     return answerTo({platform::toValue(request), platform::toValue(configuration)});
+}
+
+Result<std::map<std::string, platform::Bytes>> TAVEndpointClient::loadImages(const Value::Array& images,
+                                                                             platform::Duration limit)
+{
+    limit = std::clamp<platform::Duration>(limit, platform::Duration::zero(), std::chrono::minutes(1));
+    const auto message = call("LoadImages", {images, static_cast<std::uint64_t>(limit.count())}, limit);
+    if (!message) return std::unexpected(message.error());
+    std::map<std::string, platform::Bytes> loaded;
+    if (const platform::Dictionary* entries = message->args[0].asDictionary())
+        for (const auto& [name, image] : *entries)
+            if (image.asBytes()) loaded.emplace(name, *image.asBytes());
+    return loaded;
 }
 
 Result<std::unique_ptr<TAVFlusherClient>> TAVFlusherClient::connect(const std::string& endpoint,

@@ -2,6 +2,7 @@
 
 #include <cstdint>
 #include <functional>
+#include <map>
 #include <memory>
 #include <optional>
 #include <string>
@@ -68,8 +69,9 @@ protected:
     /// Sends a call; `handler` gets its arguments, or the error in `TAVClientErrorDomain`.
     void send(std::string_view member, std::vector<platform::Value> arguments,
               std::function<void(platform::Result<platform::ipc::Message>)> handler);
-    /// Sends a call and waits for its answer.
-    platform::Result<platform::ipc::Message> call(std::string_view member, std::vector<platform::Value> arguments = {});
+    /// Sends a call and waits for its answer, which may take the daemon `more` than others do.
+    platform::Result<platform::ipc::Message> call(std::string_view member, std::vector<platform::Value> arguments = {},
+                                                  platform::Duration more = {});
     /// Sends a request whose answer is (query id, reply, error).
     void sendRequest(std::vector<platform::Value> arguments, AnswerHandler handler);
     /// Sends such a request and waits for its answer.
@@ -87,6 +89,10 @@ public:
 
     /// More results and cards are served here; other kinds are not answered.
     platform::Result<TAVAnswer> request(const TAVRequest& request, const TAVSessionConfiguration& configuration);
+    /// The bytes of images, by their "url" or "id": as many of them as the daemon has within `limit`, a minute at most.
+    /// `images` are dictionaries with these keys, as they stand in answers.
+    platform::Result<std::map<std::string, platform::Bytes>> loadImages(const platform::Value::Array& images,
+                                                                        platform::Duration limit);
 
 private:
     using TAVConnection::TAVConnection;

@@ -111,6 +111,10 @@ public:
 
 private:
     [[nodiscard]] Duration timeout() const { return _request.timeout.value_or(_configuration.requestTimeout); }
+    [[nodiscard]] std::size_t maximumSize() const
+    {
+        return _request.maximumResponseSize.value_or(_configuration.maximumResponseSize);
+    }
     void progressed() { _lastProgress = std::chrono::steady_clock::now(); }
     std::size_t received(std::string_view bytes);
     bool store(std::string_view bytes);
@@ -160,7 +164,7 @@ private:
 std::size_t CurlTask::received(std::string_view bytes)
 {
     progressed();
-    if (_bodySize + bytes.size() > _configuration.maximumResponseSize) {
+    if (_bodySize + bytes.size() > maximumSize()) {
         _tooLarge = true;
         return 0;
     }
@@ -171,7 +175,7 @@ std::size_t CurlTask::received(std::string_view bytes)
             curl_off_t length = -1;
             curl_easy_getinfo(_easy, CURLINFO_CONTENT_LENGTH_DOWNLOAD_T, &length);
             const auto expected = static_cast<std::size_t>(std::max<curl_off_t>(length, 0));
-            _body.reserve(std::min(expected, _configuration.maximumResponseSize));
+            _body.reserve(std::min(expected, maximumSize()));
         }
         _body.append(bytes);
     }
@@ -390,7 +394,7 @@ void CurlTask::complete(CURLcode code, bool cancelled)
     else if (_tooLarge)
         error = urlError(kUrlTooLarge, _headerSize > kMaximumHeaderSize
                                            ? fmt::format("more than {} bytes of header fields", kMaximumHeaderSize)
-                                           : fmt::format("more than {} bytes", _configuration.maximumResponseSize));
+                                           : fmt::format("more than {} bytes", maximumSize()));
     else if (_forbiddenHop)
         error = urlError(kUrlForbiddenRedirect, "redirected to a private address");
     else if (_fileError != 0)

@@ -40,6 +40,11 @@ int FileHandle::release()
     return std::exchange(_fd, -1);
 }
 
+FileHandle FileHandle::duplicate() const
+{
+    return FileHandle(fcntl(_fd, F_DUPFD_CLOEXEC, 0));
+}
+
 namespace {
 
 std::unexpected<Error> failure(const fs::path& path)
@@ -243,6 +248,19 @@ public:
         }));
         if (!file) return failure(path);
         return std::make_unique<SystemAppendFile>(std::move(file));
+    }
+
+    Result<FileHandle> createTemporary(const fs::path& directory) override
+    {
+        FileHandle file(retried([&] { return open(directory.c_str(), O_TMPFILE | O_RDWR | O_CLOEXEC, 0600); }));
+        if (file) return file;
+        if (errno != EOPNOTSUPP && errno != EISDIR) return failure(directory);
+        // A file system, or a kernel, that knows no files without a name.
+        const fs::path path = directory / (Uuid::random().string() + ".tmp");
+        file = FileHandle(
+            retried([&] { return open(path.c_str(), O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600); }));
+        if (!file || unlink(path.c_str()) != 0) return failure(path);
+        return file;
     }
 
 private:

@@ -26,6 +26,8 @@ public:
     [[nodiscard]] explicit operator bool() const { return _fd >= 0; }
     /// Gives the descriptor up; the caller closes it.
     int release();
+    /// Another descriptor of the same open file; none where the process has too many, or where this is none.
+    [[nodiscard]] FileHandle duplicate() const;
 
 private:
     int _fd = -1;
@@ -80,6 +82,9 @@ public:
     [[nodiscard]] virtual Result<FileHandle> openForReading(const std::filesystem::path& path) = 0;
     /// Makes a new, empty file, mode 0600, and opens it; one that is there already is an error (EEXIST).
     [[nodiscard]] virtual Result<std::unique_ptr<AppendFile>> createForAppending(const std::filesystem::path& path) = 0;
+    /// A new, empty file in a directory that is there, without a name, for reading and writing: it goes with its last
+    /// user.
+    [[nodiscard]] virtual Result<FileHandle> createTemporary(const std::filesystem::path& directory) = 0;
 };
 
 [[nodiscard]] std::unique_ptr<FileSystem> makeSystemFiles();

@@ -59,6 +59,8 @@ struct UrlRequest {
     Bytes body;
     /// The longest the request may go without receiving anything; none is the session's.
     std::optional<Duration> timeout;
+    /// Bytes of the answer's body, unpacked; none is the session's limit. More is kUrlTooLarge.
+    std::optional<std::size_t> maximumResponseSize = std::nullopt;
     /// ReloadIgnoringCache neither answers from a cache nor asks it for validators.
     enum class CachePolicy { Protocol, ReloadIgnoringCache } cachePolicy = CachePolicy::Protocol;
 };

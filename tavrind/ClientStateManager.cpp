@@ -35,6 +35,7 @@ ClientStateManager::ClientStateManager(Assembly& assembly)
     : _assembly(assembly), _persistSessions(assembly.userDefaults.boolean("TAVPersistSessions")),
       stateCacheQueue(assembly.device.serialQueue("com.quorvane.tavrind.stateCache")),
       _imageHostsQueue(assembly.device.concurrentQueue("com.quorvane.tavrind.imageHostsQueue")),
+      _imageQueue(assembly.device.serialQueue("com.quorvane.tavrind.images")),
       _listener(assembly.device.ipc.anonymous(endpointInterface(), "com.quorvane.tavrind.endpoint"))
 {}
 
@@ -125,18 +126,6 @@ void ClientStateManager::request(std::shared_ptr<TAVRequest> request,
         state->card(card, std::move(reply));
     else
         reply.abandon();
-}
-
-void ClientStateManager::processImagesFromResponse(const Value&, const std::shared_ptr<const TAVBag>&) {}
-
-std::set<std::string> ClientStateManager::validImageHosts() const
-{
-    return _imageHostsQueue->sync([this] { return _validImageHosts; });
-}
-
-void ClientStateManager::loadImages(Value::Array, std::uint64_t, platform::Reply<Value> reply)
-{
-    reply(Value(platform::Dictionary()));
 }
 
 } // namespace tavrin

@@ -360,7 +360,7 @@ void ClientState::_completed(ExchangePtr exchange, std::optional<Bytes> data, st
     _forceFetch(*response);
 }
 
-/// What is made of an answer besides the reply: images are fetched, result sets cached.
+/// What is made of an answer besides the reply: images are fetched ahead, result sets cached.
 void ClientState::_useAnswer(const Exchange& exchange, const JsonDocument& document)
 {
     const bool preload = _queue->sync([this] { return !_configuration || !_configuration->dontPreloadImages; });

@@ -63,6 +63,8 @@ Answer spoilt(std::string_view fault, std::string body)
     Request request;
     request.path = "/search";
     request.query = "q=a%20b";
+    request.secure = true;
+    request.headers = {{"Host", "127.0.0.1:8443"}};
     const auto faults = parseFaults(fault);
     for (const Fault& f : faults.value()) spoil(answer, f, request);
     return answer;
@@ -85,6 +87,9 @@ TEST(Faults, SpoilsAnswers)
     const Answer redirect = spoilt("redirect", "[]");
     EXPECT_EQ(redirect.status, 302);
     EXPECT_EQ(*findHeader(redirect.headers, "location"), "/search?q=a%20b") << "to itself";
+    EXPECT_EQ(*findHeader(spoilt("elsewhere", "[]").headers, "location"), "https://localhost:8443/search?q=a%20b");
+    EXPECT_EQ(spoilt("empty", "[]").body, "");
+    EXPECT_EQ(spoilt("endless", "[]").body, "[]");
     EXPECT_EQ(*findHeader(spoilt("status:429,retryafter:86400", "[]").headers, "Retry-After"), "86400");
     const Answer bomb = spoilt("gzipbomb:1000000", "[]");
     EXPECT_LT(bomb.body.size(), 4096u);

@@ -6,6 +6,7 @@
 #include <sys/socket.h>
 
 #include "platform/Error.h"
+#include "tools/devserver/Images.h"
 
 namespace devserver {
 namespace {
@@ -86,6 +87,24 @@ TEST_F(ServiceTest, MistakesInRequestsAreNamed)
     }
     EXPECT_EQ(post("/search?q=a").status, 405);
     EXPECT_EQ(get("/search?q=" + std::string(2001, 'a')).status, 400);
+}
+
+TEST_F(ServiceTest, ImagesTakeTheBytesThatAreAskedFor)
+{
+    const std::string plain = get("/images/a%2Fb").body;
+    EXPECT_TRUE(plain.starts_with("\x89PNG\r\n\x1a\n"));
+    EXPECT_EQ(plain, imageFor("a/b"));
+    EXPECT_NE(plain, get("/images/c").body);
+    EXPECT_EQ(get("/images/a%2Fb?size=20").body, plain) << "it needs more";
+    for (const std::size_t size : {plain.size() + 12, std::size_t{20'000}}) {
+        const std::string padded = get("/images/a%2Fb?size=" + std::to_string(size)).body;
+        EXPECT_EQ(padded.size(), size);
+        const std::size_t before = plain.size() - 12; // the last chunk
+        EXPECT_EQ(padded.substr(0, before), plain.substr(0, before));
+        EXPECT_EQ(padded.substr(before + 4, 4), "fiLl");
+        EXPECT_TRUE(padded.ends_with(plain.substr(before)));
+    }
+    EXPECT_EQ(get("/images/a?size=16777217").status, 400);
 }
 
 TEST_F(ServiceTest, FlightsAreFoundByNumberAndAirline)

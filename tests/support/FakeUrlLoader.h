@@ -1,7 +1,9 @@
 #pragma once
 
+#include <cstdlib>
 #include <memory>
 #include <string>
+#include <unistd.h>
 #include <vector>
 
 #include "platform/HttpCache.h"
@@ -26,8 +28,13 @@ public:
         [[nodiscard]] const UrlRequest& originalRequest() const override { return _request; }
         [[nodiscard]] Value timingData() const override { return timing; }
 
+        /// The body of a transfer goes into its file.
         void respond(int status, std::string body, HttpHeaders headers = {})
         {
+            if (files.download) {
+                if (pwrite(files.download.fd(), body.data(), body.size(), 0) < 0) std::abort();
+                body.clear();
+            }
             finish(Bytes(std::move(body)), UrlResponse{_request.url, true, status, std::move(headers)}, std::nullopt);
         }
         void fail(Error error) { finish(std::nullopt, std::nullopt, std::move(error)); }

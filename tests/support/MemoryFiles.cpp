@@ -100,6 +100,12 @@ Result<FileHandle> MemoryFiles::openForReading(const fs::path& path)
     return handle;
 }
 
+Result<FileHandle> MemoryFiles::createTemporary(const fs::path& directory)
+{
+    if (const int error = faultOf("temporary", directory)) return std::unexpected(Error::posix(error));
+    return FileHandle(memfd_create("temporary", MFD_CLOEXEC));
+}
+
 class MemoryFiles::Appending final : public AppendFile {
 public:
     Appending(MemoryFiles& files, fs::path path) : _files(files), _path(std::move(path)) {}

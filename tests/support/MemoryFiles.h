@@ -12,7 +12,8 @@ namespace platform::test {
 /// Files in memory. An operation fails when the test says so.
 class MemoryFiles final : public FileSystem {
 public:
-    /// Asked before every operation ("read", "write", "replace", "mkdir", "info", "remove", "list", "create", "append") with its path; a
+    /// Asked before every operation ("read", "write", "replace", "mkdir", "info", "remove", "list", "create", "append",
+    /// "temporary") with its path; a
     /// number other than 0 is the errno that it fails with.
     std::function<int(std::string_view operation, const std::filesystem::path& path)> fault;
 
@@ -30,6 +31,7 @@ public:
     Result<std::vector<std::string>> list(const std::filesystem::path& path) override;
     Result<FileHandle> openForReading(const std::filesystem::path& path) override;
     Result<std::unique_ptr<AppendFile>> createForAppending(const std::filesystem::path& path) override;
+    Result<FileHandle> createTemporary(const std::filesystem::path& directory) override;
 
 private:
     class Appending;

@@ -93,7 +93,13 @@ struct EchoDaemon final : TAVDaemonXPC, TAVDiagnosticsXPC, TAVEndpointXPC {
         echoed->geoSessionEntityString = *configuration->identifier;
         reply(request->queryId, std::move(echoed), std::nullopt);
     }
-    void loadImages(Value::Array, std::uint64_t, platform::Reply<Value> reply) override { reply(Dictionary()); }
+    void loadImages(Value::Array images, std::uint64_t timeout, platform::Reply<Value> reply) override
+    {
+        Dictionary loaded;
+        for (const Value& image : images)
+            loaded.set(*image["id"].asString(), platform::Bytes(std::string("\0pixels", 7) + std::to_string(timeout)));
+        reply(std::move(loaded));
+    }
     Value status() override { return Value::dictionaryOf({{"pid", 1}}); }
     std::string statistics() override { return "# EOF\n"; }
 };
@@ -193,6 +199,11 @@ TEST_F(ClientTest, EveryOperationCrossesBothWays)
     auto view = TAVEndpointClient::connect(daemon->endpoint).value();
     EXPECT_EQ(view->request(TAVMoreResultsRequest(), {"com.example", "Example/1"})->reply->geoSessionEntityString,
               "com.example");
+    EXPECT_EQ(view->loadImages({Dictionary{{"id", "a"}}, Dictionary{{"id", "b"}}}, 3ms).value(),
+              (std::map<std::string, platform::Bytes>{{"a", platform::Bytes(std::string("\0pixels3000000", 14))},
+                                                      {"b", platform::Bytes(std::string("\0pixels3000000", 14))}}));
+    EXPECT_EQ(view->loadImages({Dictionary{{"id", "a"}}}, 2min)->at("a").view().substr(7), "60000000000") << "a minute at most";
+    EXPECT_EQ(view->loadImages({Dictionary{{"id", "a"}}}, -1s)->at("a").view().substr(7), "0");
 }
 
 TEST_F(ClientTest, RequestsAreOutstandingSideBySide)

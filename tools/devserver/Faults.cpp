@@ -31,6 +31,7 @@ constexpr KindEntry kKinds[] = {
     {"status", Kind::Status, "CODE", 200, 599},
     {"cut", Kind::Cut, ""},
     {"half", Kind::Half, ""},
+    {"endless", Kind::Endless, ""},
     {"empty", Kind::Empty, ""},
     {"notjson", Kind::NotJson, ""},
     {"wrongtype", Kind::WrongType, ""},
@@ -38,6 +39,7 @@ constexpr KindEntry kKinds[] = {
     {"huge", Kind::Huge, "BYTES", 1, 1u << 30},
     {"deep", Kind::Deep, "DEPTH", 1, 1'000'000},
     {"redirect", Kind::Redirect, ""},
+    {"elsewhere", Kind::Elsewhere, ""},
     {"gzipbomb", Kind::GzipBomb, "BYTES", 1, 256u << 20},
     {"retryafter", Kind::RetryAfter, "SECONDS", 0, 31'536'000},
 };
@@ -90,6 +92,16 @@ Value wrongValue(const Value& value)
     }
 }
 
+/// This service under its other name, "https://localhost:8443".
+std::string otherHost(const Request& request)
+{
+    const std::string* host = findHeader(request.headers, "Host");
+    const std::size_t colon = host ? host->rfind(':') : std::string::npos;
+    const bool byName = host && host->starts_with("localhost");
+    return fmt::format("{}://{}{}", request.secure ? "https" : "http", byName ? "127.0.0.1" : "localhost",
+                       colon == std::string::npos ? "" : host->substr(colon));
+}
+
 std::string spoiltJson(const std::string& body, Kind kind)
 {
     const auto value = platform::parseJson(body);
@@ -127,7 +139,8 @@ void spoil(Answer& answer, const Fault& fault, const Request& request)
 {
     switch (fault.kind) {
     case Kind::Delay:
-    case Kind::Hang: return;
+    case Kind::Hang:
+    case Kind::Endless: return;
     case Kind::Status:
         if (fault.number >= 300) answer = errorAnswer(0, fmt::format("status {} on demand", fault.number));
         if (fault.number == 204 || fault.number == 304) answer.body.clear(); // HTTP allows them none
@@ -142,8 +155,10 @@ void spoil(Answer& answer, const Fault& fault, const Request& request)
     case Kind::Huge: answer.paddedTo = fault.number; return;
     case Kind::Deep: answer.body = std::string(fault.number, '[') + std::string(fault.number, ']'); return;
     case Kind::Redirect:
+    case Kind::Elsewhere:
         answer = {.status = 302};
-        answer.headers.emplace_back("Location", request.path + (request.query.empty() ? "" : "?" + request.query));
+        answer.headers.emplace_back("Location", (fault.kind == Kind::Elsewhere ? otherHost(request) : "") + request.path +
+                                                    (request.query.empty() ? "" : "?" + request.query));
         return;
     case Kind::GzipBomb:
         answer.body = gzipOfBlanks(fault.number);

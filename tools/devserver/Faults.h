@@ -21,6 +21,7 @@ struct Fault {
         Status,
         Cut,
         Half,
+        Endless,
         Empty,
         NotJson,
         WrongType,
@@ -28,6 +29,7 @@ struct Fault {
         Huge,
         Deep,
         Redirect,
+        Elsewhere,
         GzipBomb,
         RetryAfter
     };
@@ -40,7 +42,7 @@ struct Fault {
 /// Reads "delay:200,status:503". The error says what is allowed.
 [[nodiscard]] std::expected<std::vector<Fault>, std::string> parseFaults(std::string_view text);
 
-/// Spoils an answer that was ready to go. Delays and hangs change nothing here.
+/// Spoils an answer that was ready to go. Delays, hangs and bodies without an end change nothing here.
 void spoil(Answer& answer, const Fault& fault, const Request& request);
 
 /// The names of endpoints that faults, the log and the counters use.

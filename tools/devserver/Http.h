@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstddef>
+#include <functional>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -38,6 +39,8 @@ struct Answer {
     Headers headers;
     std::size_t paddedTo = 0; ///< blanks are sent after the body up to this length
     bool cut = false;         ///< the connection is closed in the middle of the body
+    /// Set: after the body, which tells no length, blanks are sent one by one for as long as this says.
+    std::function<bool()> goesOn{};
 };
 
 [[nodiscard]] Answer jsonAnswer(const platform::Value& value, int status = 200);

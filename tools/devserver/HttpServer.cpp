@@ -67,10 +67,22 @@ void setStreamedBody(httplib::Response& response, Answer answer)
     response.set_content_provider(length, answer.contentType, std::move(write));
 }
 
+/// A body without an end; the connection's is all that the client gets.
+void setEndlessBody(httplib::Response& response, Answer answer)
+{
+    const std::string type = answer.contentType;
+    response.set_chunked_content_provider(
+        type, [answer = std::move(answer)](std::size_t offset, httplib::DataSink& sink) {
+            if (offset == 0 && !answer.body.empty()) return sink.write(answer.body.data(), answer.body.size());
+            return answer.goesOn() && sink.write(" ", 1);
+        });
+}
+
 void convert(Answer answer, httplib::Response& response)
 {
     response.status = answer.status;
     for (const auto& [name, value] : answer.headers) response.set_header(name, value);
+    if (answer.goesOn) return setEndlessBody(response, std::move(answer));
     // What is sent whole, the library packs for clients that accept it.
     const bool packed = findHeader(answer.headers, "Content-Encoding") != nullptr;
     if (packed || answer.cut || answer.paddedTo > answer.body.size())

@@ -2,6 +2,7 @@
 
 #include <array>
 #include <cstdint>
+#include <random>
 
 #include <zlib.h>
 
@@ -33,9 +34,18 @@ std::string chunk(std::string_view type, std::string_view data)
     return bigEndian(static_cast<std::uint32_t>(data.size())) + checked + bigEndian(static_cast<std::uint32_t>(sum));
 }
 
+/// Bytes that don't pack.
+std::string noise(std::uint64_t seed, std::size_t size)
+{
+    std::mt19937_64 generator(seed);
+    std::string bytes(size, '\0');
+    for (char& byte : bytes) byte = static_cast<char>(generator() & 0xFF);
+    return bytes;
+}
+
 } // namespace
 
-std::string imageFor(std::string_view identifier)
+std::string imageFor(std::string_view identifier, std::size_t size)
 {
     const std::uint64_t bits = digest(identifier);
     const std::array<char, 6> palette{static_cast<char>(0xF2),
@@ -55,8 +65,11 @@ std::string imageFor(std::string_view identifier)
     }
     const std::string header =
         bigEndian(kSize) + bigEndian(kSize) + std::string("\x08\x03\0\0\0", 5); // 8 bits, palette
-    return "\x89PNG\r\n\x1a\n" + chunk("IHDR", header) + chunk("PLTE", {palette.data(), palette.size()}) +
-           chunk("IDAT", zlibPacked(rows)) + chunk("IEND", "");
+    const std::string picture = "\x89PNG\r\n\x1a\n" + chunk("IHDR", header) +
+                                chunk("PLTE", {palette.data(), palette.size()}) + chunk("IDAT", zlibPacked(rows));
+    const std::string end = chunk("IEND", "");
+    const std::size_t needed = picture.size() + end.size() + end.size(); // an empty chunk is as long as the end
+    return picture + (size < needed ? "" : chunk("fiLl", noise(bits, size - needed))) + end;
 }
 
 } // namespace devserver

@@ -109,7 +109,8 @@ Value SearchAnswers::resultSet(std::string_view query, const std::vector<const M
         Dictionary description{{"name", section->name},
                                {"bundle_id", section->bundleIdentifier},
                                {"score", scoreOf(*group.front())},
-                               {"count", group.size()}};
+                               {"count", group.size()},
+                               {"glyph", Value::dictionaryOf({{"id", fmt::format("glyph.{}", section->key)}})}};
         if (group.size() > kResultsPerSection)
             description.set("more_results_url", moreUrl(query, *section, kResultsPerSection));
         sectionList.emplace_back(std::move(description));
@@ -208,6 +209,12 @@ std::optional<Value> SearchAnswers::card(std::string_view identifier) const
     const Entry* entry = _catalogue.find(identifier);
     if (!entry) return std::nullopt;
     Value found = result(*entry, popularityScore(*entry));
+    Value::Array posters; // by URL and, where that fails, by identifier
+    for (const char* view : {"front", "back"})
+        posters.push_back(Value::dictionaryOf(
+            {{"url", fmt::format("{}/images/{}.{}", _base, platform::percentEncodePathSegment(entry->identifier), view)},
+             {"id", fmt::format("{}.{}", entry->identifier, view)}}));
+    found.mutableDictionary().set("posters", std::move(posters));
     found.mutableDictionary().set(
         "card",
         Value::dictionaryOf({{"title", entry->title},

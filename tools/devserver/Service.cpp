@@ -19,6 +19,8 @@ namespace {
 constexpr std::string_view kImages = "/images/";
 constexpr std::string_view kResources = "/resources/";
 constexpr std::size_t kMaximumQueryBytes = 2000;
+constexpr std::size_t kMaximumImage = 16u << 20;
+constexpr std::chrono::milliseconds kPace{50}; // of a body without an end
 
 /// Faults that hold the request back, before it is answered. False if the peer went meanwhile.
 bool holdBack(Gate& gate, const std::vector<Fault>& faults, int connection)
@@ -34,12 +36,13 @@ bool holdBack(Gate& gate, const std::vector<Fault>& faults, int connection)
     return true;
 }
 
-std::size_t offsetIn(const Request& request)
+/// The number under `name`; 0 for none.
+std::size_t numberIn(const Request& request, std::string_view name)
 {
-    const std::string text = request.item("offset").value_or("0");
-    std::size_t offset = 0;
-    const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), offset);
-    return error == std::errc() ? offset : 0;
+    const std::string text = request.item(name).value_or("0");
+    std::size_t number = 0;
+    const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);
+    return error == std::errc() ? number : 0;
 }
 
 bool isSearch(std::string_view endpoint)
@@ -82,7 +85,13 @@ Answer Service::answer(const Request& request)
     const bool isUpload = endpoint == "upload" && request.method == "POST";
     Upload upload = isUpload ? checkUpload(request) : Upload();
     Answer answer = isUpload ? upload.answer() : answerEndpoint(endpoint, request);
-    for (const Fault& fault : wanted) spoil(answer, fault, request);
+    for (const Fault& fault : wanted) {
+        spoil(answer, fault, request);
+        if (fault.kind == Fault::Kind::Endless)
+            answer.goesOn = [this, connection = request.connection] {
+                return gate.wait(kPace, connection) == Gate::Outcome::TimeOver;
+            };
+    }
     if (isUpload) {
         const std::string line = uploads.add(std::move(upload), answer);
         if (onUpload) onUpload(line);
@@ -107,7 +116,9 @@ Answer Service::answerEndpoint(std::string_view endpoint, const Request& request
     }
     if (endpoint == "image") {
         const std::string identifier = platform::percentDecode(std::string_view(request.path).substr(kImages.size()));
-        Answer answer{.contentType = "image/png", .body = imageFor(identifier)};
+        const std::size_t size = numberIn(request, "size");
+        if (size > kMaximumImage) return errorAnswer(400, fmt::format("a size is {} bytes at most", kMaximumImage));
+        Answer answer{.contentType = "image/png", .body = imageFor(identifier, size)};
         answer.headers.emplace_back("Cache-Control", "max-age=86400");
         return answer;
     }
@@ -137,7 +148,7 @@ Answer Service::answerSearch(std::string_view endpoint, const Request& request)
     } else if (endpoint == "more") {
         const Section* section = findSection(request.item("section").value_or(""));
         if (!section) return errorAnswer(400, "no section of that name");
-        sets = _answers.moreResults(query, *section, offsetIn(request));
+        sets = _answers.moreResults(query, *section, numberIn(request, "offset"));
     } else {
         sets = _answers.search(query, request.item("qtype") != "suggested");
     }

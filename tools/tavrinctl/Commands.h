@@ -19,6 +19,8 @@ using Command = std::function<void(const Options&)>;
 void addSearchCommand(CLI::App& app, Command& chosen);
 /// zkw, more, card, lookup, flight and warm.
 void addOtherRequestCommands(CLI::App& app, Command& chosen);
+/// images.
+void addImagesCommand(CLI::App& app, Command& chosen);
 /// bag, sessions, status and stats.
 void addInspectCommands(CLI::App& app, Command& chosen);
 /// resource.

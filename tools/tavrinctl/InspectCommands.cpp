@@ -119,6 +119,8 @@ void showStatus(const Options& options)
             fmt::format("process {}, {}, last query {}", text(connection["pid"]),
                         client.empty() ? "no known client" : client, text(connection["currentQueryId"])));
     }
+    for (std::size_t i = 0; i < status["validImageHosts"].count(); ++i)
+        row(i == 0 ? "image hosts" : "", text(status["validImageHosts"][i]));
     if (const Dictionary* open = status["transactions"].asDictionary(); open && !open->empty()) {
         for (const auto& [name, count] : *open) row("pending", fmt::format("{} ({})", printable(name), text(count)));
     }

@@ -28,6 +28,7 @@ int main(int argc, char** argv)
     app.add_option("-n,--limit", options.limit, "Results to list; 0 is all")->capture_default_str();
     addSearchCommand(app, chosen);
     addOtherRequestCommands(app, chosen);
+    addImagesCommand(app, chosen);
     addInspectCommands(app, chosen);
     addResourceCommand(app, chosen);
     addFlusherCommands(app, chosen);

@@ -1,0 +1,269 @@
+// The images of answers: fetched ahead into the HTTP cache, and handed to clients.
+
+#include "tavrind/ClientStateManager.h"
+
+#include <algorithm>
+
+#include <fmt/format.h>
+
+#include "CoreTavrin/TAVBag.h"
+#include "CoreTavrin/TAVError.h"
+#include "platform/Clock.h"
+#include "platform/Device.h"
+#include "platform/HttpCache.h"
+#include "platform/Queue.h"
+#include "platform/Transactions.h"
+#include "searchrecords/ZRNetworkFeedback.h"
+#include "tavrind/Assembly.h"
+#include "tavrind/ClientSessionManager.h"
+#include "tavrind/FeedbackRecords.h"
+#include "tavrind/ResponseImages.h"
+#include "tavrind/TavrinBagController.h"
+#include "tavrind/TavrinFeedback.h"
+#include "tavrind/TavrinLogging.h"
+#include "tavrind/mmap_file.h"
+
+namespace tavrin {
+
+using platform::Dictionary;
+using platform::Error;
+using platform::Url;
+using platform::UrlResponse;
+using platform::Value;
+
+namespace {
+
+using namespace std::chrono_literals;
+
+/// How long a client may wait.
+constexpr platform::Duration kLongestLoad = 60s;
+/// How long a fetch may take that never stops receiving.
+constexpr platform::Duration kLongestFetch = 5min;
+/// Bytes: as much as the HTTP cache keeps of one answer.
+constexpr std::size_t kMaximumImage = 10u << 20;
+/// Bytes: half of what an array of a D-Bus message may have.
+constexpr std::size_t kMaximumAnswer = 32u << 20;
+constexpr std::size_t kMaximumHosts = 1000;
+
+const platform::Log& log()
+{
+    return TavrinLogForCategory(kLogImages);
+}
+
+/// All URLs, in the order in which they are fetched.
+std::vector<Url> inOrder(OrderedImages images)
+{
+    std::vector<Url> urls = std::move(images.primary);
+    std::ranges::move(images.secondary, std::back_inserter(urls));
+    return urls;
+}
+
+} // namespace
+
+/// One fetch that is under way.
+struct ClientStateManager::ImageLoad {
+    Url url;
+    platform::Transactions::Token transaction;
+    std::shared_ptr<ZRStartNetworkSearchFeedback> start;
+    platform::Result<platform::FileHandle> file;
+    platform::Clock::TimerId limit = 0;
+    std::weak_ptr<platform::UrlTask> task; // which owns this
+};
+
+std::set<std::string> ClientStateManager::validImageHosts() const
+{
+    return _imageHostsQueue->sync([this] { return _validImageHosts; });
+}
+
+void ClientStateManager::_addImageHosts(const std::set<std::string>& hosts)
+{
+    for (const std::string& host : hosts) {
+        if (_validImageHosts.size() == kMaximumHosts) return;
+        _validImageHosts.insert(host);
+    }
+}
+
+void ClientStateManager::processImagesFromResponse(const Value& response, const std::shared_ptr<const TAVBag>& bag)
+{
+    if (!bag) return;
+    _imageQueue->async([weak = weak_from_this(), response, bag] {
+        const auto self = weak.lock();
+        if (!self) return;
+        OrderedImages images;
+        std::set<std::string> seen;
+        enumerateImagesInResponse(
+            response, [&](const Value& image) { collectOrderedImages(*bag, image, &seen, images); });
+        if (images.hosts.empty()) return;
+        self->_imageHostsQueue->barrierAsync([weak, hosts = std::move(images.hosts)] {
+            if (const auto manager = weak.lock()) manager->_addImageHosts(hosts);
+        });
+        self->_fetchImages(inOrder(std::move(images)), *bag, nullptr);
+    });
+}
+
+void ClientStateManager::loadImages(Value::Array images, std::uint64_t timeout, platform::Reply<Value> reply)
+{
+    const auto bag = _assembly.bagController->currentBag();
+    if (!bag) return reply(Dictionary());
+
+    OrderedImages found;
+    for (const Value& image : images) collectOrderedImages(*bag, image, nullptr, found);
+    if (found.hosts.empty()) return reply(Dictionary());
+    _imageHostsQueue->barrierSync([&] { _addImageHosts(found.hosts); });
+
+    const auto done = std::make_shared<platform::Event>();
+    _imageQueue->async([weak = weak_from_this(), urls = inOrder(std::move(found)), bag,
+                        group = ImageGroup(done.get(), [done](void*) { done->signal(); })] {
+        if (const auto self = weak.lock()) self->_fetchImages(urls, *bag, group);
+    });
+    const platform::Duration limit(
+        static_cast<std::int64_t>(std::min(timeout, static_cast<std::uint64_t>(kLongestLoad.count()))));
+    platform::Queue::current()->suspendUntil(
+        *done, limit,
+        [weak = weak_from_this(), images = std::move(images), bag, reply = std::move(reply)]() mutable {
+            const auto self = weak.lock();
+            reply(self ? self->_cachedImages(images, *bag) : Value(Dictionary()));
+        });
+}
+
+platform::Bytes ClientStateManager::_cachedImage(const std::optional<Url>& url) const
+{
+    const auto cache = _assembly.urlSession->cache();
+    const auto kept = url && cache ? cache->find(*url) : std::nullopt;
+    return kept ? kept->body : platform::Bytes();
+}
+
+Value ClientStateManager::_cachedImages(const Value::Array& images, const TAVBag& bag) const
+{
+    Dictionary loaded;
+    std::size_t size = 0;
+    const auto map = [&](const std::string& name, platform::Bytes image) {
+        if (size + image.size() > kMaximumAnswer)
+            return log().error("no room for {} bytes of image {}", image.size(), name);
+        size += image.size();
+        loaded.set(name, std::move(image));
+    };
+    for (const Value& image : images) {
+        const std::string* url = image["url"].asString();
+        const std::string* identifier = image["id"].asString();
+        if ((url && loaded.contains(*url)) || (!url && identifier && loaded.contains(*identifier))) continue;
+        if (const auto data = _cachedImage(url ? Url::parse(*url) : std::nullopt); !data.empty()) {
+            log().log("mapping image url {} to {} bytes of data", *url, data.size());
+            map(*url, data);
+        } else if (identifier) {
+            const auto other = _cachedImage(bag.urlForIdentifier(*identifier));
+            if (other.empty()) continue;
+            log().log("mapping image id {} to {} bytes of data", *identifier, other.size());
+            map(*identifier, other);
+        }
+    }
+    return loaded;
+}
+
+void ClientStateManager::_fetchImages(const std::vector<Url>& urls, const TAVBag& bag, const ImageGroup& group)
+{
+    const auto seconds = bag.timeoutIntervalForRequest();
+    const auto timeout = seconds ? std::optional(requestTimeout(*seconds)) : std::nullopt;
+    for (const Url& url : urls) _fetchImageURL(url, timeout, group);
+}
+
+void ClientStateManager::_fetchImageURL(const Url& url, std::optional<platform::Duration> timeoutInterval,
+                                        const ImageGroup& group)
+{
+    _imageQueue->assertOnQueue();
+    if (!url.scheme().starts_with("http")) return log().fault("invalid url scheme: {}", url.string());
+    if (_imageFetches.join(url, group)) return;
+    const auto cache = _assembly.urlSession->cache();
+    if (cache && cache->find(url)) return log().log("found {} in cache", url.string());
+    if (!_imageFetches.add({url, timeoutInterval}, group))
+        return log().error("{} images wait already, not fetching {}", ImageFetches::kWaiting, url.string());
+    _startImageFetches();
+}
+
+void ClientStateManager::_startImageFetches()
+{
+    while (const auto fetch = _imageFetches.next()) _startImageFetch(*fetch);
+}
+
+void ClientStateManager::_startImageFetch(const ImageFetch& fetch)
+{
+    log().log("fetching image {}", fetch.url.string());
+    platform::Device& device = _assembly.device;
+    platform::UrlRequest request{
+        .url = fetch.url, .timeout = fetch.timeoutInterval, .maximumResponseSize = kMaximumImage};
+    const auto load = std::make_shared<ImageLoad>(
+        ImageLoad{.url = fetch.url,
+                  .transaction = device.transactions.begin("imageFetch"),
+                  .start = startNetworkSearchFeedback("", request, StartSearchTrigger::ImageLoad, EndpointType::TavrinImage),
+                  .file = device.files.createTemporary(device.directories.temporary),
+                  .task = {}});
+    _addImageFeedback(load->start);
+
+    platform::TransferFiles files;
+    if (load->file) files.download = load->file->duplicate();
+    const auto task = _assembly.urlSession->transferTask(
+        std::move(request), std::move(files),
+        [weak = weak_from_this(), load, &device](auto, const std::optional<UrlResponse>& response,
+                                                 const std::optional<Error>& error) {
+            device.clock.cancel(load->limit);
+            if (const auto self = weak.lock()) self->_endImageFetch(*load, response, error);
+        });
+    load->task = task;
+    load->limit = device.clock.after(kLongestFetch, [task = load->task] {
+        if (const auto endless = task.lock()) endless->cancel();
+    });
+    task->resume();
+}
+
+void ClientStateManager::_endImageFetch(const ImageLoad& load, const std::optional<UrlResponse>& response,
+                                        const std::optional<Error>& error)
+{
+    const std::string& url = load.url.string();
+    const int statusCode = response ? response->statusCode : 0;
+    if (error) {
+        log().error("Error fetching image {}: {}", url, error->description());
+        ClientSessionManager::reportErrorAsTavrindFeedback(
+            makeTAVError(TAVErrorInvalidResponse, fmt::format("image fetch error {}", error->description())), _assembly);
+    } else if (statusCode != 200) {
+        log().error("Bad status code {} for image {}", statusCode, url);
+    } else {
+        log().log("Fetched image {}", url);
+        _keepImage(load, *response);
+    }
+    _imageQueue->async([weak = weak_from_this(), ended = load.url] {
+        const auto self = weak.lock();
+        if (!self) return;
+        self->_imageFetches.end(ended);
+        self->_startImageFetches();
+    });
+}
+
+void ClientStateManager::_keepImage(const ImageLoad& load, const UrlResponse& response)
+{
+    if (!load.file) {
+        log().error("opening file failed {}", load.file.error().description());
+        return ClientSessionManager::reportErrorAsTavrindFeedback(
+            makeTAVError(TAVErrorInvalidResponse, "file open failed"), _assembly);
+    }
+    const auto image = mmapFileHandle(*load.file);
+    if (!image) {
+        log().error("mmap failed {}", image.error().description());
+        return ClientSessionManager::reportErrorAsTavrindFeedback(image.error(), _assembly);
+    }
+    log().log("caching {} bytes for {}", image->size(), load.url.string());
+    if (const auto cache = _assembly.urlSession->cache()) cache->store(load.url, response, *image);
+    const auto task = load.task.lock();
+    _addImageFeedback(std::make_shared<ZREndNetworkSearchFeedback>(load.start, image->size(), response.statusCode,
+                                                                   task ? task->timingData() : Value()));
+}
+
+void ClientStateManager::_addImageFeedback(std::shared_ptr<ZRFeedback> record)
+{
+    const auto& manager = _assembly.clientSessionManager;
+    if (!manager) return;
+    record->timestamp = _assembly.device.clock.hostTicks();
+    manager->addTavrinFeedback(
+        std::make_shared<TavrinFeedback>(std::move(record), 0, "", ClientSessionManager::tavrindUserAgent()));
+}
+
+} // namespace tavrin

@@ -1,0 +1,551 @@
+#include <fmt/format.h>
+
+#include "CoreTavrin/TAVBag.h"
+#include "platform/HttpCache.h"
+#include "searchrecords/ZRErrorFeedback.h"
+#include "searchrecords/ZRNetworkFeedback.h"
+#include "tavrind/ClientStateManager.h"
+#include "tavrind/ImageFetches.h"
+#include "tavrind/ResponseImages.h"
+#include "tests/support/DaemonFixture.h"
+#include "tests/support/TestHttpServer.h"
+
+namespace tavrin::test {
+namespace {
+
+using namespace std::chrono_literals;
+using platform::LogLevel;
+using platform::Url;
+using platform::test::httpAnswer;
+using platform::test::LogCapture;
+using platform::test::TestHttpServer;
+using Strings = std::vector<std::string>;
+
+Value image(const std::string& url)
+{
+    return Dictionary{{"url", url}};
+}
+
+Value json(std::string_view text)
+{
+    return platform::parseJson(text).value();
+}
+
+Strings textsOf(const std::vector<Url>& urls)
+{
+    Strings texts;
+    for (const Url& url : urls) texts.push_back(url.string());
+    return texts;
+}
+
+// ---- Finding and ordering
+
+TEST(ResponseImages, StandUnderTheirRoles)
+{
+    Strings found;
+    const auto names = [&](const Value& response) {
+        found.clear();
+        enumerateImagesInResponse(response, [&](const Value& each) { found.push_back(platform::toJson(each)); });
+        return found;
+    };
+    const Strings roles{"thumbnail",       "image",          "image_overlay", "value_image",  "secondary_image",
+                        "icon",            "completion_icon", "more_icons",   "base_icon",    "glyph",
+                        "rt_glyph",        "title_glyph",    "attribution_glyph", "more_glyphs", "more_glyphs1",
+                        "more_glyphs2",    "play_button",    "posters",       "badge_image"};
+    EXPECT_EQ(imageRoleKeys().size(), roles.size());
+    for (const std::string& role : roles) {
+        EXPECT_EQ(names(Dictionary{{role, Dictionary{{"id", role}}}}).size(), 1u) << role;
+        EXPECT_EQ(names(Value::Array{Dictionary{{"card", Dictionary{{role, Value::Array{1, 2}}}}}}), (Strings{"1", "2"})) << role;
+    }
+    const struct {
+        const char* response;
+        Strings found;
+    } cases[]{
+        {R"([{"results": [{"more": {"deeper": [[{"icon": {"id": "a"}}]]}}, {"icon": {"id": "b"}}]}, {"glyph": {"id": "c"}}])",
+         {R"({"id":"a"})", R"({"id":"b"})", R"({"id":"c"})"}},
+        {R"({"icon": "https://a.example/x", "image": 3, "thumbnail": null, "posters": []})", {}},
+        {R"({"icon": {"id": "a", "image": {"id": "inside"}}, "posters": [[{"image": {"id": "inside"}}]]})",
+         {R"({"id":"a","image":{"id":"inside"}})", R"([{"image":{"id":"inside"}}])"}},
+        {R"({"Icon": {"id": "a"}, "icons": {"id": "a"}, "url": "https://a.example/", "id": "a"})", {}},
+        {"[]", {}},
+        {"3", {}},
+    };
+    for (const auto& c : cases) EXPECT_EQ(names(json(c.response)), c.found) << c.response;
+    EXPECT_TRUE(names(Value()).empty());
+}
+
+TEST(ResponseImages, DepthAndNumberCostNoStack)
+{
+    Value deep = Dictionary{{"icon", Dictionary{{"id", "bottom"}}}};
+    for (int i = 0; i < 5000; ++i) deep = Dictionary{{"card", Value::Array{std::move(deep)}}};
+    EXPECT_EQ(collectResponseImageIdentifiers(deep), (Value::Array{Dictionary{{"id", "bottom"}}}));
+
+    Value::Array many(10'000, Dictionary{{"icon", Dictionary{{"id", "a"}}}});
+    EXPECT_EQ(collectResponseImageIdentifiers(many).size(), 10'000u);
+}
+
+TEST(ResponseImages, AreIdentifiedByUrlAndId)
+{
+    const Value response = json(R"([{"icon": {"url": "x", "id": "i", "width": 3}, "posters": [{"id": "j", "url": 3}, "k", {}]}])");
+    EXPECT_EQ(collectResponseImageIdentifiers(response),
+              (Value::Array{Dictionary{{"url", "x"}, {"id", "i"}}, Dictionary{{"id", "j"}}}));
+}
+
+TEST(ResponseImages, AreOrderedByWhatIsKnownOfThem)
+{
+    const TAVBag bag(Dictionary{{"imageURL", "https://i.example/{id}"}}, "A/1");
+    std::set<std::string> seen;
+    OrderedImages images;
+    const Value all = json(R"([
+        {"url": "https://A.example/1", "id": "one"}, {"id": "a b"}, {"url": "https://A.example/1"}, "text", 7, null,
+        {"url": "not a url", "id": "two"}, {"url": "mailto:x@y.example"}, {"url": "file:///etc/passwd"},
+        {"url": "ftp://f.example/x"}, {"id": 4, "url": ["x"]}, {"id": "one"}, {}])");
+    for (const Value& each : *all.asArray()) collectOrderedImages(bag, each, &seen, images);
+    EXPECT_EQ(textsOf(images.primary), (Strings{"https://A.example/1", "https://i.example/a%20b", "ftp://f.example/x"}));
+    EXPECT_EQ(textsOf(images.secondary), (Strings{"https://i.example/one", "https://i.example/two"}));
+    EXPECT_EQ(images.hosts, (std::set<std::string>{"a.example", "f.example", "i.example"}));
+
+    OrderedImages again;
+    for (int i = 0; i < 2; ++i) collectOrderedImages(bag, image("https://A.example/1"), &seen, again);
+    EXPECT_TRUE(again.primary.empty()) << "all of them were seen";
+    EXPECT_EQ(again.hosts, std::set<std::string>{"a.example"});
+    for (int i = 0; i < 2; ++i) collectOrderedImages(bag, image("https://A.example/1"), nullptr, again);
+    EXPECT_EQ(again.primary.size(), 2u) << "nothing is looked up";
+    collectOrderedImages(TAVBag(Value(), "A/1"), Dictionary{{"id", "x"}}, nullptr, again);
+    EXPECT_EQ(again.primary.size(), 2u) << "the bag has no template";
+}
+
+TEST(ImageFetches, TakeTurnsAndThoseAwaitedFirst)
+{
+    ImageFetches fetches;
+    const auto url = [](std::size_t i) { return *Url::parse(fmt::format("https://a.example/{}", i)); };
+    const auto next = [&] {
+        const auto fetch = fetches.next();
+        return fetch ? fetch->url.string().substr(18) : "none";
+    };
+    for (std::size_t i = 0; i < ImageFetches::kUnderWay; ++i) {
+        EXPECT_TRUE(fetches.add({url(i), {}}, nullptr));
+        EXPECT_EQ(next(), std::to_string(i));
+    }
+    for (std::size_t i : {100, 101, 102}) EXPECT_TRUE(fetches.add({url(i), {}}, nullptr));
+    EXPECT_EQ(next(), "none");
+    const auto group = std::make_shared<int>();
+    EXPECT_TRUE(fetches.add({url(103), {}}, group));
+    EXPECT_TRUE(fetches.join(url(0), group)) << "it is under way";
+    EXPECT_TRUE(fetches.join(url(101), group)) << "it moves ahead";
+    EXPECT_TRUE(fetches.join(url(101), group));
+    EXPECT_TRUE(fetches.join(url(100), nullptr)) << "it doesn't";
+    EXPECT_FALSE(fetches.join(url(104), group));
+    EXPECT_EQ(group.use_count(), 5);
+
+    for (const char* expected : {"103", "101", "100", "102", "none"}) {
+        fetches.end(url(fetches.underWay() + 200)); // unknown
+        fetches.end(url(expected == std::string("103") ? 0 : expected == std::string("101") ? 1 : expected == std::string("100") ? 2 : 3));
+        EXPECT_EQ(next(), expected);
+    }
+    EXPECT_EQ(group.use_count(), 4) << "the first has ended";
+    fetches.end(url(101));
+    EXPECT_EQ(group.use_count(), 2);
+
+    for (std::size_t i = 0; i < ImageFetches::kWaiting; ++i) EXPECT_TRUE(fetches.add({url(1000 + i), {}}, nullptr));
+    EXPECT_FALSE(fetches.add({url(5), {}}, group));
+    EXPECT_EQ(fetches.waiting(), ImageFetches::kWaiting);
+}
+
+// ---- The daemon
+
+struct ImageLoadingTest : DaemonTest {
+    static constexpr const char* kImageBag = R"({"version": "9", "searchURL": "https://s.example/search",
+        "imageURL": "https://i.example/{id}", "timeoutIntervalForRequest": 7})";
+
+    ImageLoadingTest()
+    {
+        start();
+        deliverBag(kImageBag);
+        connection = client();
+        endpoint = device.ipc.connect("com.quorvane.TAVEndpointXPC");
+        device.drain();
+        session->records.clear();
+    }
+
+    /// A search that is answered with `images` under the role "posters".
+    void answerSearch(const Value& images)
+    {
+        (void)search(*connection, ++queryId, fmt::format("query {}", queryId));
+        session->records.clear();
+        respond(platform::toJson(Value::Array{Dictionary{{"status", "OK"}, {"results", Value::Array{Dictionary{{"posters", images}}}}}}));
+    }
+    std::shared_ptr<FakeCall> load(Value::Array images, std::uint64_t timeout = 1'000'000'000)
+    {
+        auto call = endpoint->call("LoadImages", {std::move(images), timeout});
+        device.drain();
+        return call;
+    }
+    /// Image requests that have been sent, in order, and are not answered yet.
+    std::vector<std::shared_ptr<platform::test::FakeUrlLoader::Task>> fetches()
+    {
+        std::vector<std::shared_ptr<platform::test::FakeUrlLoader::Task>> found;
+        for (const auto& task : tasks())
+            if (task->resumed && !task->finished && task->originalRequest().maximumResponseSize) found.push_back(task);
+        return found;
+    }
+    Strings fetched()
+    {
+        Strings urls;
+        for (const auto& task : fetches()) urls.push_back(task->originalRequest().url.string());
+        return urls;
+    }
+    /// Answers every image request, and those that follow.
+    void answerAll(int status = 200, const std::string& body = "pixels")
+    {
+        for (auto left = fetches(); !left.empty(); left = fetches()) {
+            for (const auto& task : left) task->respond(status, body);
+            device.drain();
+        }
+    }
+    std::string cached(const std::string& url)
+    {
+        const auto kept = assembly().urlSession->cache()->find(*Url::parse(url));
+        return kept ? std::string(kept->body.view()) : "none";
+    }
+    static std::string bytes(FakeCall& call, const std::string& name)
+    {
+        const platform::Bytes* image = call.argument(0)[name].asBytes();
+        return image ? std::string(image->view()) : "none";
+    }
+
+    std::shared_ptr<FakeConnection> connection, endpoint;
+    std::int64_t queryId = 0;
+};
+
+TEST_F(ImageLoadingTest, AnAnswersImagesAreFetchedAhead)
+{
+    LogCapture log;
+    answerSearch(json(R"([{"url": "https://a.example/1", "id": "one"}, {"id": "two"}, {"url": "https://a.example/1"}])"));
+    EXPECT_EQ(fetched(), (Strings{"https://a.example/1", "https://i.example/two", "https://i.example/one"}));
+    EXPECT_EQ(fetches()[0]->originalRequest().timeout, platform::Duration(7s));
+    EXPECT_EQ(device.transactions.open().at("imageFetch"), 3);
+    EXPECT_EQ(assembly().clientStateManager->validImageHosts(), (std::set<std::string>{"a.example", "i.example"}));
+    EXPECT_TRUE(log.has(LogLevel::Default, "Tavrin_Images", "fetching image https://a.example/1"));
+
+    const auto started = session->last<ZRStartNetworkSearchFeedback>();
+    ASSERT_TRUE(started);
+    EXPECT_EQ(started->url, "https://i.example/one");
+    EXPECT_EQ(started->input, "");
+    EXPECT_EQ(static_cast<int>(started->triggerEvent), 15);
+    EXPECT_EQ(static_cast<int>(started->endpoint), 7);
+    EXPECT_TRUE(started->headers.asDictionary());
+    EXPECT_EQ(session->records.back()->userAgent, ClientSessionManager::tavrindUserAgent());
+    EXPECT_EQ(session->records.back()->queryId, 0);
+
+    const auto last = fetches().back();
+    last->timing = Dictionary{{"mark", 1}};
+    last->respond(200, "pixels");
+    device.drain();
+    const auto end = session->last<ZREndNetworkSearchFeedback>();
+    ASSERT_TRUE(end);
+    EXPECT_EQ(end->uuid, started->uuid);
+    EXPECT_EQ(end->responseSize, 6);
+    EXPECT_EQ(end->statusCode, 200);
+    EXPECT_EQ(end->networkTimingData["mark"], Value(1));
+    EXPECT_EQ(cached("https://i.example/one"), "pixels");
+    EXPECT_TRUE(log.has(LogLevel::Default, "Tavrin_Images", "Fetched image https://i.example/one"));
+    EXPECT_TRUE(log.has(LogLevel::Default, "Tavrin_Images", "caching 6 bytes for https://i.example/one"));
+    answerAll();
+    EXPECT_TRUE(device.transactions.open().empty());
+    EXPECT_EQ(device.clock.pendingTimers(), 0u) << "nothing wakes for a fetch that has ended";
+
+    session->records.clear();
+    answerSearch(json(R"([{"url": "https://a.example/1", "id": "one"}])"));
+    EXPECT_TRUE(fetches().empty());
+    EXPECT_EQ(session->takeClasses(), Strings{"TAVEndNetworkSearchFeedback"}) << "of the search";
+    EXPECT_EQ(log.count("found https://a.example/1 in cache"), 1);
+}
+
+TEST_F(ImageLoadingTest, AClientMayDoWithoutThem)
+{
+    connection->call("Configure", {Dictionary{{"class", "TAVSessionConfiguration"},
+                                              {"identifier", "com.quorvane.vistrel"},
+                                              {"userAgent", "Vistrel/4"},
+                                              {"dontPreloadImages", true}}});
+    answerSearch(Value::Array{image("https://a.example/1")});
+    EXPECT_TRUE(fetches().empty());
+}
+
+TEST_F(ImageLoadingTest, WhatIsOnItsWayIsFetchedOnce)
+{
+    answerSearch(Value::Array{image("https://a.example/1")});
+    answerSearch(Value::Array{image("https://a.example/1"), image("https://a.example/2")});
+    auto call = load({image("https://a.example/2"), image("https://a.example/2")});
+    EXPECT_EQ(fetched(), (Strings{"https://a.example/1", "https://a.example/2"}));
+    fetches()[1]->respond(200, "two");
+    device.drain();
+    ASSERT_TRUE(call->answered()) << "it waits for none of the others";
+    EXPECT_EQ(bytes(*call, "https://a.example/2"), "two");
+    answerAll(404);
+    answerSearch(Value::Array{image("https://a.example/1")});
+    EXPECT_EQ(fetched(), Strings{"https://a.example/1"}) << "what failed is tried again";
+}
+
+TEST_F(ImageLoadingTest, OtherSchemesAreRefused)
+{
+    LogCapture log;
+    answerSearch(Value::Array{image("ftp://a.example/1"), image("file://a.example/etc/passwd"), image("https://a.example/1")});
+    EXPECT_EQ(fetched(), Strings{"https://a.example/1"});
+    EXPECT_TRUE(log.has(LogLevel::Fault, "Tavrin_Images", "invalid url scheme: ftp://a.example/1"));
+    EXPECT_TRUE(log.has(LogLevel::Fault, "Tavrin_Images", "invalid url scheme: file://a.example/etc/passwd"));
+    auto call = load({image("ftp://a.example/1")});
+    EXPECT_TRUE(call->answered()) << "there is nothing to wait for";
+    EXPECT_EQ(call->argument(0), Value(Dictionary()));
+}
+
+TEST_F(ImageLoadingTest, AClientGetsWhatIsThereInTime)
+{
+    const auto begin = device.clock.hostTicks();
+    auto call = load({image("https://a.example/1"), Dictionary{{"url", "https://a.example/2"}, {"id", "two"}},
+                      Dictionary{{"id", "three"}}, image("https://a.example/4"), Dictionary{{"url", "nowhere"}, {"id", "five"}},
+                      Dictionary()},
+                     2'000'000'000);
+    EXPECT_EQ(fetched(), (Strings{"https://a.example/1", "https://a.example/2", "https://i.example/three", "https://a.example/4",
+                                  "https://i.example/two", "https://i.example/five"}));
+    auto behind = load({});
+    EXPECT_TRUE(behind->pending()) << "the connection's calls keep their order";
+    const auto all = fetches();
+    all[0]->respond(200, "one");
+    all[1]->respond(404, "no such image");
+    for (const std::size_t i : {2, 4, 5}) all[i]->respond(200, fmt::format("image {}", i));
+    device.drain();
+    EXPECT_TRUE(call->pending()) << "the fourth may still come";
+    device.advance(2s - platform::Duration(device.clock.hostTicks() - begin) - 1ns);
+    EXPECT_TRUE(call->pending());
+    device.advance(1ns);
+    ASSERT_TRUE(call->answered());
+    EXPECT_EQ(call->argument(0), Value(Dictionary{{"https://a.example/1", platform::Bytes("one")},
+                                                  {"two", platform::Bytes("image 4")},
+                                                  {"three", platform::Bytes("image 2")},
+                                                  {"five", platform::Bytes("image 5")}}));
+    EXPECT_TRUE(behind->answered());
+
+    all[3]->respond(200, "late");
+    device.drain();
+    auto again = load({image("https://a.example/4")}, 0);
+    ASSERT_TRUE(again->answered());
+    EXPECT_EQ(bytes(*again, "https://a.example/4"), "late") << "it came after all";
+}
+
+TEST_F(ImageLoadingTest, NobodyWaitsLongerThanAMinute)
+{
+    auto call = load({image("https://a.example/1")}, UINT64_MAX);
+    device.advance(60s - 1ns);
+    EXPECT_TRUE(call->pending());
+    device.advance(1ns);
+    EXPECT_TRUE(call->answered());
+    EXPECT_EQ(fetches().size(), 1u) << "it goes on";
+    device.advance(5min);
+    EXPECT_TRUE(fetches().empty()) << "but not for ever";
+    EXPECT_TRUE(device.transactions.open().empty());
+}
+
+TEST_F(ImageLoadingTest, WithoutABagThereAreNoImages)
+{
+    startWithoutBag();
+    auto unready = device.ipc.connect("com.quorvane.TAVEndpointXPC");
+    auto call = unready->call("LoadImages", {Value::Array{image("https://a.example/1")}, 1'000'000});
+    device.drain();
+    ASSERT_TRUE(call->answered());
+    EXPECT_EQ(call->argument(0), Value(Dictionary()));
+    assembly().clientStateManager->processImagesFromResponse(Dictionary{{"icon", image("https://a.example/1")}}, nullptr);
+    device.drain();
+    EXPECT_TRUE(fetches().empty());
+}
+
+TEST_F(ImageLoadingTest, EveryFailureIsToldAndTheNextImageIsFetched)
+{
+    using Task = platform::test::FakeUrlLoader::Task;
+    const struct {
+        const char* name;
+        std::function<void(Task&)> answer;
+        const char* log;
+        std::string domain;
+        const char* reason; // of the error that is recorded; null for none
+    } cases[]{
+        {"transport", [](Task& task) { task.fail(platform::Error::withReason("UrlErrorDomain", -1004, "refused")); },
+         "Error fetching image https://a.example/0: UrlErrorDomain -1004: refused", "TAVErrorDomain",
+         "image fetch error UrlErrorDomain -1004: refused"},
+        {"status", [](Task& task) { task.respond(503, "later"); }, "Bad status code 503 for image https://a.example/1", "",
+         nullptr},
+        {"no status", [](Task& task) { task.finish(platform::Bytes(), std::nullopt, std::nullopt); },
+         "Bad status code 0 for image https://a.example/2", "", nullptr},
+        {"nothing in it", [](Task& task) { task.respond(200, ""); }, "mmap failed POSIX 22", "POSIX", "Invalid argument"},
+    };
+    int number = 0;
+    for (const auto& c : cases) {
+        LogCapture log;
+        const std::string url = fmt::format("https://a.example/{}", number++);
+        auto call = load({image(url)});
+        session->records.clear();
+        c.answer(*fetches().at(0));
+        device.drain();
+        ASSERT_TRUE(call->answered()) << c.name;
+        EXPECT_EQ(call->argument(0), Value(Dictionary())) << c.name;
+        EXPECT_TRUE(log.has(LogLevel::Error, "Tavrin_Images", c.log)) << c.name;
+        EXPECT_EQ(session->records.size(), c.reason ? 1u : 0u) << c.name;
+        if (const auto error = session->last<ZRErrorFeedback>()) {
+            EXPECT_EQ(error->error->domain, c.domain) << c.name;
+            EXPECT_TRUE(error->error->reason().starts_with(c.reason)) << error->error->reason();
+            EXPECT_EQ(session->records.back()->userAgent, ClientSessionManager::tavrindUserAgent());
+        }
+        EXPECT_TRUE(device.transactions.open().empty()) << c.name;
+    }
+
+    device.files.fault = [](std::string_view operation, const auto&) { return operation == "temporary" ? EMFILE : 0; };
+    LogCapture log;
+    auto call = load({image("https://a.example/9")});
+    EXPECT_FALSE(fetches().at(0)->files.download);
+    fetches()[0]->respond(200, "pixels");
+    device.drain();
+    EXPECT_TRUE(log.has(LogLevel::Error, "Tavrin_Images", "opening file failed POSIX 24"));
+    EXPECT_EQ(session->last<ZRErrorFeedback>()->error->reason(), "file open failed");
+    EXPECT_EQ(call->argument(0), Value(Dictionary()));
+}
+
+TEST_F(ImageLoadingTest, TenThousandImagesTakeTurns)
+{
+    Value::Array images;
+    for (int i = 0; i < 10'100; ++i) images.push_back(image(fmt::format("https://host{}.example/{}", i, i)));
+    LogCapture log;
+    answerSearch(images);
+    EXPECT_EQ(fetches().size(), ImageFetches::kUnderWay);
+    EXPECT_EQ(log.count("wait already, not fetching"), 10'100 - 10'000 - static_cast<int>(ImageFetches::kUnderWay));
+    EXPECT_EQ(assembly().clientStateManager->validImageHosts().size(), 1000u);
+
+    auto call = load({image("https://a.example/wanted"), image("https://host9000.example/9000")});
+    EXPECT_TRUE(call->pending());
+    fetches()[0]->respond(200, "a");
+    fetches()[0]->respond(200, "b");
+    device.drain();
+    const Strings now = fetched();
+    EXPECT_EQ(now.back(), "https://host9000.example/9000") << "what is awaited goes before what is fetched ahead";
+    answerAll();
+    ASSERT_TRUE(call->answered());
+    EXPECT_EQ(bytes(*call, "https://host9000.example/9000"), "pixels");
+    EXPECT_EQ(cached("https://host0.example/0"), "a");
+    EXPECT_TRUE(device.transactions.open().empty());
+}
+
+TEST_F(ImageLoadingTest, AnAnswerHoldsSoManyBytesOnly)
+{
+    const std::string large(9u << 20, 'x');
+    Value::Array images;
+    for (int i = 0; i < 4; ++i) images.push_back(image(fmt::format("https://a.example/{}", i)));
+    auto call = load(images);
+    answerAll(200, large);
+    ASSERT_TRUE(call->answered());
+    EXPECT_EQ(call->argument(0).count(), 3u);
+    EXPECT_EQ(bytes(*call, "https://a.example/3"), "none");
+}
+
+TEST_F(ImageLoadingTest, NestedBeyondWhatJsonMayHaveIsNoAnswerAndNoImages)
+{
+    auto call = search(*connection, 900, "deep");
+    std::string body = R"({"icon": {"url": "https://a.example/1"}})";
+    respond(std::string(10'000, '[') + body + std::string(10'000, ']'));
+    ASSERT_TRUE(call->answered());
+    EXPECT_GT(call->argument(2).count(), 0u);
+    EXPECT_TRUE(fetches().empty());
+}
+
+// ---- Over the network, where hosts do as they like
+
+struct ImageFaults : ImageLoadingTest {
+    static void SetUpTestSuite() { setenv("no_proxy", "*", 1); }
+
+    ImageFaults()
+    {
+        platform::UrlSessionConfiguration configuration;
+        configuration.cache = platform::HttpCacheConfiguration{};
+        fakeSession = std::exchange(assembly().urlSession,
+                                    loader->makeSession(std::move(configuration), device.device.serialQueue("test.urlSession")));
+    }
+    ~ImageFaults() override
+    {
+        loader.reset(); // ends what is under way
+        device.drain();
+    }
+    bool answered(FakeCall& call)
+    {
+        return device.executor.drainUntil([&] { return call.answered(); });
+    }
+
+    std::unique_ptr<platform::UrlLoader> loader = platform::makeCurlLoader();
+    std::shared_ptr<platform::UrlSession> fakeSession; // has requests of the fixture's
+};
+
+TEST_F(ImageFaults, EachLeavesItsOwnImageOut)
+{
+    TestHttpServer elsewhere(platform::test::always({httpAnswer(200, "from elsewhere")}), {.address = "127.0.0.2"});
+    std::map<std::string, TestHttpServer::Answer> answers{
+        {"/good", {httpAnswer(200, "pixels")}},
+        {"/short", {"HTTP/1.1 200 OK\r\nContent-Length: 90\r\n\r\npixels", TestHttpServer::Then::Close}},
+        {"/reset", {"HTTP/1.1 200 OK\r\nContent-Length: 90\r\n\r\npixels", TestHttpServer::Then::Reset}},
+        {"/long", {"HTTP/1.1 200 OK\r\nContent-Length: 3\r\n\r\npixels", TestHttpServer::Then::Close}},
+        {"/html", {httpAnswer(200, "<html></html>", "Content-Type: text/html\r\n")}},
+        {"/empty", {httpAnswer(200, "")}},
+        {"/nobody", {"HTTP/1.1 200 OK\r\n\r\n", TestHttpServer::Then::Close}},
+        {"/partial", {httpAnswer(206, "pix")}},
+        {"/nohttp", {"pixels\r\n", TestHttpServer::Then::Close}},
+        {"/moved", {httpAnswer(302, "moved", "Location: " + elsewhere.url("/x").string() + "\r\n")}},
+        {"/ftp", {httpAnswer(302, "", "Location: ftp://127.0.0.1/x\r\n")}},
+        {"/loop", {httpAnswer(302, "", "Location: /loop\r\n")}},
+        {"/huge", {"HTTP/1.1 200 OK\r\nContent-Length: 10485761\r\n\r\n" + std::string((10u << 20) + 1, 'x')}},
+    };
+    TestHttpServer server(platform::test::byPath(answers));
+    Value::Array images;
+    for (const auto& [path, answer] : answers) images.push_back(image(server.url(path).string()));
+    auto call = load(images, 60'000'000'000);
+    ASSERT_TRUE(answered(*call));
+    Strings loaded;
+    for (const auto& [url, bytes] : *call->argument(0).asDictionary())
+        loaded.push_back(fmt::format("{} {}", Url::parse(url)->path(), bytes.asBytes()->view()));
+    std::ranges::sort(loaded);
+    EXPECT_EQ(loaded, (Strings{"/good pixels", "/html <html></html>", "/long pix", "/moved from elsewhere"}));
+    ASSERT_EQ(elsewhere.requests().size(), 1u);
+
+    Strings errors;
+    for (const auto& record : session->records)
+        if (const auto error = std::dynamic_pointer_cast<ZRErrorFeedback>(record->feedback)) errors.push_back(error->error->reason());
+    EXPECT_EQ(errors.size(), 8u) << "short, reset, empty, nobody, nohttp, ftp, loop, huge";
+}
+
+TEST_F(ImageFaults, WhatNeverEndsIsLeftOutAtTheLimit)
+{
+    TestHttpServer server(platform::test::byPath(
+        {{"/good", {httpAnswer(200, "pixels")}}, {"/endless", {"HTTP/1.1 200 OK\r\n\r\npixels and pixels and"}}}));
+    auto call = load({image(server.url("/endless").string()), image(server.url("/good").string())}, 3'000'000'000);
+    ASSERT_TRUE(device.executor.drainUntil([&] { return cached(server.url("/good").string()) == "pixels"; }));
+    server.waitForRequests(2);
+    EXPECT_TRUE(call->pending());
+    device.advance(3s);
+    ASSERT_TRUE(call->answered());
+    EXPECT_EQ(bytes(*call, server.url("/good").string()), "pixels");
+    EXPECT_EQ(call->argument(0).count(), 1u);
+    device.advance(5min);
+    EXPECT_TRUE(device.executor.drainUntil([&] { return device.transactions.open().empty(); })) << "it is given up in the end";
+}
+
+TEST_F(ImageFaults, ManyImagesOfOneHostAllCome)
+{
+    TestHttpServer server([](const TestHttpServer::Request& request) {
+        return TestHttpServer::Answer{httpAnswer(200, std::string(20'000, 'x') + request.target)};
+    });
+    Value::Array images;
+    for (int i = 0; i < 200; ++i) images.push_back(image(server.url(fmt::format("/{}", i)).string()));
+    auto call = load(images, 60'000'000'000);
+    ASSERT_TRUE(answered(*call));
+    EXPECT_EQ(call->argument(0).count(), 200u);
+    EXPECT_EQ(bytes(*call, server.url("/150").string()), std::string(20'000, 'x') + "/150");
+    EXPECT_EQ(server.requests().size(), 200u);
+}
+
+} // namespace
+} // namespace tavrin::test

@@ -1,0 +1,155 @@
+// tavrinctl images: what an answer's images are, as files.
+
+#include <chrono>
+#include <set>
+
+#include <CLI/CLI.hpp>
+#include <fmt/format.h>
+
+#include "CoreTavrin/TAVRequest.h"
+#include "platform/Files.h"
+#include "tavrind/ResponseImages.h"
+#include "tools/tavrinctl/Commands.h"
+#include "tools/tavrinctl/ImageFiles.h"
+#include "tools/tavrinctl/RequestRunner.h"
+
+namespace tavrin::ctl {
+
+using platform::Dictionary;
+using platform::Value;
+
+namespace {
+
+struct ImagesOptions {
+    std::string query;
+    std::vector<std::string> urls;
+    std::vector<std::string> identifiers;
+    std::string directory = ".";
+    double within = 10; ///< seconds
+};
+
+/// The images of the answer to the query, and those that were given; each once, in that order.
+Value::Array wanted(const Options& options, const ImagesOptions& imagesOptions)
+{
+    Value::Array images;
+    if (!imagesOptions.query.empty()) {
+        RequestRunner runner(options);
+        const Exchange exchange = runner.run(
+            *TAVSearchRequest::searchRequestWithString(imagesOptions.query, StartSearchTrigger::NewCharacter), imagesOptions.query);
+        if (exchange.outcome() != Outcome::Answered) throw Failure("the search before it: " + summary(exchange));
+        images = collectResponseImageIdentifiers(rawResponse(exchange));
+        if (images.empty())
+            throw Failure(fmt::format("the answer to \"{}\" names no images: try another query, or give --url or --id",
+                                      imagesOptions.query));
+    }
+    for (const std::string& url : imagesOptions.urls) {
+        if (!platform::Url::parse(url)) throw Failure(fmt::format("\"{}\" is no valid URL", url), 2);
+        images.push_back(Dictionary{{"url", url}});
+    }
+    for (const std::string& identifier : imagesOptions.identifiers) images.push_back(Dictionary{{"id", identifier}});
+
+    Value::Array once;
+    std::set<std::string> seen;
+    for (Value& image : images)
+        if (seen.insert(platform::toJson(image)).second) once.push_back(std::move(image));
+    return once;
+}
+
+std::string textOf(const Value& value)
+{
+    const std::string* text = value.asString();
+    return text ? *text : "";
+}
+
+/// The image's URL, or its identifier.
+std::string nameOf(const Value& image)
+{
+    return image["url"].isNull() ? textOf(image["id"]) : textOf(image["url"]);
+}
+
+/// Makes the directory where it isn't there; a `Failure` where it can't.
+std::filesystem::path directoryAt(platform::FileSystem& files, const std::string& path)
+{
+    std::error_code ignored;
+    const auto found = std::filesystem::canonical(path, ignored); // links to directories are fine
+    auto directory = found.empty() ? std::filesystem::absolute(path).lexically_normal() : found;
+    if (const auto made = files.createDirectories(directory); !made)
+        throw Failure(fmt::format("can't make the directory {}: give another with -o", made.error().reason()));
+    return directory;
+}
+
+void loadImages(const Options& options, const ImagesOptions& imagesOptions)
+{
+    const auto files = platform::makeSystemFiles();
+    const Value::Array images = wanted(options, imagesOptions);
+    const std::filesystem::path directory = directoryAt(*files, imagesOptions.directory);
+
+    const Session session = openSession(options);
+    const auto endpoint = valueOf(TAVEndpointClient::connect(session.endpoint));
+    endpoint->setTimeout(platform::durationFromSeconds(options.timeout));
+    const auto begin = std::chrono::steady_clock::now();
+    const auto loaded =
+        valueOf(endpoint->loadImages(images, platform::durationFromSeconds(imagesOptions.within)));
+    const std::chrono::duration<double, std::milli> latency = std::chrono::steady_clock::now() - begin;
+
+    std::set<std::filesystem::path> saved;
+    Value::Array described;
+    std::size_t bytes = 0;
+    for (const Value& image : images) {
+        Dictionary description = *image.asDictionary();
+        auto found = loaded.find(textOf(image["url"]));
+        if (found == loaded.end()) found = loaded.find(textOf(image["id"]));
+        if (found == loaded.end()) {
+            description.set("missing", true);
+            if (!options.json) printLine(fmt::format("{:>9}  {}", "missing", printable(nameOf(image))));
+        } else {
+            const std::string_view type = imageType(found->second.view());
+            const auto path = saveImage(*files, directory, imageFileName(found->first, type), found->second, saved);
+            bytes += found->second.size();
+            description.set("file", path.string());
+            description.set("bytes", found->second.size());
+            description.set("type", type.empty() ? "unknown" : type);
+            if (!options.json)
+                printLine(fmt::format("{:>9}  {}{}", found->second.size(), path.filename().string(),
+                                      type.empty() || type == "html" ? dim(" no image that is known here") : ""));
+        }
+        described.emplace_back(std::move(description));
+    }
+    if (options.json)
+        printJson(Dictionary{{"images", std::move(described)},
+                             {"directory", directory.string()},
+                             {"loaded", saved.size()},
+                             {"missing", images.size() - saved.size()},
+                             {"bytes", bytes},
+                             {"latency_ms", latency.count()}});
+    else if (!saved.empty())
+        printLine(dim(fmt::format("{} of {} images, {} bytes, in {}, within {:.1f} ms", saved.size(), images.size(), bytes,
+                                  printable(directory.string()), latency.count())));
+    if (saved.empty())
+        throw Failure(fmt::format("none of {} images came within {:g} s: the daemon's log says why (tavrind --log-level "
+                                  "info); --within gives them longer",
+                                  images.size(), imagesOptions.within));
+}
+
+} // namespace
+
+void addImagesCommand(CLI::App& app, Command& chosen)
+{
+    auto options = std::make_shared<ImagesOptions>();
+    CLI::App* command = app.add_subcommand("images", "Save the images that an answer names, as the daemon has them");
+    command->add_option("query", options->query, "What to search for");
+    command->add_option("--url", options->urls, "An image's URL; may be repeated");
+    command->add_option("--id", options->identifiers, "An image's identifier, for which the bag has the URL; may be repeated");
+    command->add_option("-o,--output", options->directory, "Where to save them; files that are there are left as they are")
+        ->capture_default_str();
+    command->add_option("--within", options->within, "Seconds in which they must be there")
+        ->check(CLI::Range(0.0, 60.0))
+        ->capture_default_str();
+    command->callback([options, &chosen] {
+        if (options->query.empty() && options->urls.empty() && options->identifiers.empty())
+            throw CLI::RequiredError("query, --url or --id");
+        chosen = [options](const Options& common) { loadImages(common, *options); };
+    });
+}
+
+} // namespace tavrin::ctl
