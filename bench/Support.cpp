@@ -292,6 +292,12 @@ std::string Service::url(const std::string& path) const
     return fmt::format("http://127.0.0.1:{}{}", _port, path);
 }
 
+void Service::setAnswer(std::string answer)
+{
+    const std::lock_guard lock(_answerMutex);
+    _answer = std::move(answer);
+}
+
 void Service::serve(int connection)
 {
     std::string received;
@@ -307,9 +313,10 @@ void Service::serve(int connection)
         const bool bag = received.starts_with("GET /bag");
         received.erase(0, end + 4);
         if (!bag && _delay > 0) poll(&fds[1], 1, static_cast<int>(_delay * 1000));
+        std::unique_lock lock(_answerMutex);
         const std::string body =
-            bag ? platform::toJson(platform::Value::dictionaryOf({{"version", "1"}, {"searchURL", url("/search")}}))
-                : _answer;
+            bag ? platform::toJson(platform::Value::dictionaryOf({{"version", "1"}, {"searchURL", url("/search")}})) : _answer;
+        lock.unlock();
         const std::string answer = fmt::format(
             "HTTP/1.1 200 OK\r\nContent-Type: application/json\r\nContent-Length: {}\r\n\r\n{}", body.size(), body);
         if (send(connection, answer.data(), answer.size(), MSG_NOSIGNAL) < 0) break;

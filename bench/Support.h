@@ -5,6 +5,7 @@
 #include <filesystem>
 #include <functional>
 #include <memory>
+#include <mutex>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -130,13 +131,16 @@ public:
     ~Service();
     [[nodiscard]] std::string url(const std::string& path) const;
     void setDelay(double delay) { _delay = delay; }
+    /// JSON to answer from now on.
+    void setAnswer(std::string answer);
 
 private:
     void serve(int connection);
     int _listener = -1;
     int _wake[2] = {-1, -1};
     unsigned _port = 0;
-    std::string _answer;
+    std::mutex _answerMutex;
+    std::string _answer; // under the mutex
     std::atomic<double> _delay;
     std::thread _acceptor;
     std::vector<std::thread> _threads;
@@ -147,6 +151,7 @@ private:
 [[nodiscard]] std::vector<Row> search();
 [[nodiscard]] std::vector<Row> hit();
 [[nodiscard]] std::vector<Row> typing();
+[[nodiscard]] std::vector<Row> images();
 [[nodiscard]] std::vector<Row> startUp();
 [[nodiscard]] std::vector<Row> memory();
 [[nodiscard]] std::vector<Row> waiters();

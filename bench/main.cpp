@@ -20,8 +20,9 @@ int main(int argc, char** argv)
         bool onRequestOnly = false;
     } kBenchmarks[] = {{"ipc", ipc},
                        {"search", search},
-                        {"hit", hit},
-                        {"typing", typing},
+                       {"images", images},
+                       {"hit", hit},
+                       {"typing", typing},
                        {"start", startUp},
                        {"memory", memory},
                        {"waiters", waiters},

@@ -1,8 +1,8 @@
 #include <string>
 
+#include "CoreTavrin/ResponseImages.h"
 #include "CoreTavrin/TAVBag.h"
 #include "fuzz/Check.h"
-#include "tavrind/ResponseImages.h"
 
 using platform::Value;
 
@@ -31,7 +31,8 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
 {
     const auto response = platform::parseJson(textOf(data, size));
     if (!response) return 0;
-    static const tavrin::TAVBag bag(Value::dictionaryOf({{"imageURL", "https://images.example/{id}?size=1"}}), "Fuzz/1");
+    static const tavrin::TAVBag bag(Value::dictionaryOf({{"imageURL", "https://images.example/{id}?size=1"}}),
+                                    "Fuzz/1");
 
     std::size_t count = 0;
     std::set<std::string> seen;

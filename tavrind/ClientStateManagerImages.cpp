@@ -6,6 +6,7 @@
 
 #include <fmt/format.h>
 
+#include "CoreTavrin/ResponseImages.h"
 #include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVError.h"
 #include "platform/Clock.h"
@@ -17,11 +18,10 @@
 #include "tavrind/Assembly.h"
 #include "tavrind/ClientSessionManager.h"
 #include "tavrind/FeedbackRecords.h"
-#include "tavrind/ResponseImages.h"
+#include "tavrind/mmap_file.h"
 #include "tavrind/TavrinBagController.h"
 #include "tavrind/TavrinFeedback.h"
 #include "tavrind/TavrinLogging.h"
-#include "tavrind/mmap_file.h"
 
 namespace tavrin {
 
@@ -91,8 +91,8 @@ void ClientStateManager::processImagesFromResponse(const Value& response, const 
         if (!self) return;
         OrderedImages images;
         std::set<std::string> seen;
-        enumerateImagesInResponse(
-            response, [&](const Value& image) { collectOrderedImages(*bag, image, &seen, images); });
+        enumerateImagesInResponse(response,
+                                  [&](const Value& image) { collectOrderedImages(*bag, image, &seen, images); });
         if (images.hosts.empty()) return;
         self->_imageHostsQueue->barrierAsync([weak, hosts = std::move(images.hosts)] {
             if (const auto manager = weak.lock()) manager->_addImageHosts(hosts);
@@ -119,8 +119,7 @@ void ClientStateManager::loadImages(Value::Array images, std::uint64_t timeout, 
     const platform::Duration limit(
         static_cast<std::int64_t>(std::min(timeout, static_cast<std::uint64_t>(kLongestLoad.count()))));
     platform::Queue::current()->suspendUntil(
-        *done, limit,
-        [weak = weak_from_this(), images = std::move(images), bag, reply = std::move(reply)]() mutable {
+        *done, limit, [weak = weak_from_this(), images = std::move(images), bag, reply = std::move(reply)]() mutable {
             const auto self = weak.lock();
             reply(self ? self->_cachedImages(images, *bag) : Value(Dictionary()));
         });
@@ -191,12 +190,12 @@ void ClientStateManager::_startImageFetch(const ImageFetch& fetch)
     platform::Device& device = _assembly.device;
     platform::UrlRequest request{
         .url = fetch.url, .timeout = fetch.timeoutInterval, .maximumResponseSize = kMaximumImage};
-    const auto load = std::make_shared<ImageLoad>(
-        ImageLoad{.url = fetch.url,
-                  .transaction = device.transactions.begin("imageFetch"),
-                  .start = startNetworkSearchFeedback("", request, StartSearchTrigger::ImageLoad, EndpointType::TavrinImage),
-                  .file = device.files.createTemporary(device.directories.temporary),
-                  .task = {}});
+    const auto load = std::make_shared<ImageLoad>(ImageLoad{
+        .url = fetch.url,
+        .transaction = device.transactions.begin("imageFetch"),
+        .start = startNetworkSearchFeedback("", request, StartSearchTrigger::ImageLoad, EndpointType::TavrinImage),
+        .file = device.files.createTemporary(device.directories.temporary),
+        .task = {}});
     _addImageFeedback(load->start);
 
     platform::TransferFiles files;
@@ -223,7 +222,8 @@ void ClientStateManager::_endImageFetch(const ImageLoad& load, const std::option
     if (error) {
         log().error("Error fetching image {}: {}", url, error->description());
         ClientSessionManager::reportErrorAsTavrindFeedback(
-            makeTAVError(TAVErrorInvalidResponse, fmt::format("image fetch error {}", error->description())), _assembly);
+            makeTAVError(TAVErrorInvalidResponse, fmt::format("image fetch error {}", error->description())),
+            _assembly);
     } else if (statusCode != 200) {
         log().error("Bad status code {} for image {}", statusCode, url);
     } else {

@@ -26,8 +26,8 @@ struct ImageFetch {
 ///
 ///     add ──► waiting ──► next ──► under way ──► end
 ///
-/// Each URL is here once. As many as `kUnderWay` are under way; the others follow in the order in which they came, those
-/// that someone waits for before those that are fetched ahead. One queue at a time.
+/// Each URL is here once. As many as `kUnderWay` are under way; the others follow in the order in which they came,
+/// those that someone waits for before those that are fetched ahead. One queue at a time.
 class ImageFetches {
 public:
     /// Each takes a descriptor, and a connection where the service doesn't multiplex.
@@ -35,8 +35,8 @@ public:
     /// Answers may name any number of images.
     static constexpr std::size_t kWaiting = 10'000;
 
-    /// Takes part in the fetch of that URL, which moves ahead if it has to wait and `group` isn't null. False where there
-    /// is none.
+    /// Takes part in the fetch of that URL, which moves ahead if it has to wait and `group` isn't null. False where
+    /// there is none.
     bool join(const platform::Url& url, const ImageGroup& group);
     /// Adds the fetch of a URL that isn't here; a null group is none. False where too many are waiting.
     bool add(ImageFetch fetch, const ImageGroup& group);
@@ -56,7 +56,7 @@ private:
     };
 
     std::unordered_map<std::string, Entry> _fetches; // by URL
-    std::deque<std::string> _awaited;                // the turns; one that has moved ahead has an idle one in the other list
+    std::deque<std::string> _awaited; // the turns; one that has moved ahead has an idle one in the other list
     std::deque<std::string> _ahead;
     std::size_t _underWay = 0;
 };

@@ -1,12 +1,12 @@
 #include <fmt/format.h>
 
+#include "CoreTavrin/ResponseImages.h"
 #include "CoreTavrin/TAVBag.h"
 #include "platform/HttpCache.h"
 #include "searchrecords/ZRErrorFeedback.h"
 #include "searchrecords/ZRNetworkFeedback.h"
 #include "tavrind/ClientStateManager.h"
 #include "tavrind/ImageFetches.h"
-#include "tavrind/ResponseImages.h"
 #include "tests/support/DaemonFixture.h"
 #include "tests/support/TestHttpServer.h"
 
@@ -48,14 +48,16 @@ TEST(ResponseImages, StandUnderTheirRoles)
         enumerateImagesInResponse(response, [&](const Value& each) { found.push_back(platform::toJson(each)); });
         return found;
     };
-    const Strings roles{"thumbnail",       "image",          "image_overlay", "value_image",  "secondary_image",
-                        "icon",            "completion_icon", "more_icons",   "base_icon",    "glyph",
-                        "rt_glyph",        "title_glyph",    "attribution_glyph", "more_glyphs", "more_glyphs1",
-                        "more_glyphs2",    "play_button",    "posters",       "badge_image"};
+    const Strings roles{"thumbnail",    "image",           "image_overlay",     "value_image", "secondary_image",
+                        "icon",         "completion_icon", "more_icons",        "base_icon",   "glyph",
+                        "rt_glyph",     "title_glyph",     "attribution_glyph", "more_glyphs", "more_glyphs1",
+                        "more_glyphs2", "play_button",     "posters",           "badge_image"};
     EXPECT_EQ(imageRoleKeys().size(), roles.size());
     for (const std::string& role : roles) {
         EXPECT_EQ(names(Dictionary{{role, Dictionary{{"id", role}}}}).size(), 1u) << role;
-        EXPECT_EQ(names(Value::Array{Dictionary{{"card", Dictionary{{role, Value::Array{1, 2}}}}}}), (Strings{"1", "2"})) << role;
+        EXPECT_EQ(names(Value::Array{Dictionary{{"card", Dictionary{{role, Value::Array{1, 2}}}}}}),
+                  (Strings{"1", "2"}))
+            << role;
     }
     const struct {
         const char* response;
@@ -86,7 +88,8 @@ TEST(ResponseImages, DepthAndNumberCostNoStack)
 
 TEST(ResponseImages, AreIdentifiedByUrlAndId)
 {
-    const Value response = json(R"([{"icon": {"url": "x", "id": "i", "width": 3}, "posters": [{"id": "j", "url": 3}, "k", {}]}])");
+    const Value response =
+        json(R"([{"icon": {"url": "x", "id": "i", "width": 3}, "posters": [{"id": "j", "url": 3}, "k", {}]}])");
     EXPECT_EQ(collectResponseImageIdentifiers(response),
               (Value::Array{Dictionary{{"url", "x"}, {"id", "i"}}, Dictionary{{"id", "j"}}}));
 }
@@ -101,7 +104,8 @@ TEST(ResponseImages, AreOrderedByWhatIsKnownOfThem)
         {"url": "not a url", "id": "two"}, {"url": "mailto:x@y.example"}, {"url": "file:///etc/passwd"},
         {"url": "ftp://f.example/x"}, {"id": 4, "url": ["x"]}, {"id": "one"}, {}])");
     for (const Value& each : *all.asArray()) collectOrderedImages(bag, each, &seen, images);
-    EXPECT_EQ(textsOf(images.primary), (Strings{"https://A.example/1", "https://i.example/a%20b", "ftp://f.example/x"}));
+    EXPECT_EQ(textsOf(images.primary),
+              (Strings{"https://A.example/1", "https://i.example/a%20b", "ftp://f.example/x"}));
     EXPECT_EQ(textsOf(images.secondary), (Strings{"https://i.example/one", "https://i.example/two"}));
     EXPECT_EQ(images.hosts, (std::set<std::string>{"a.example", "f.example", "i.example"}));
 
@@ -140,7 +144,10 @@ TEST(ImageFetches, TakeTurnsAndThoseAwaitedFirst)
 
     for (const char* expected : {"103", "101", "100", "102", "none"}) {
         fetches.end(url(fetches.underWay() + 200)); // unknown
-        fetches.end(url(expected == std::string("103") ? 0 : expected == std::string("101") ? 1 : expected == std::string("100") ? 2 : 3));
+        fetches.end(url(expected == std::string("103")   ? 0
+                        : expected == std::string("101") ? 1
+                        : expected == std::string("100") ? 2
+                                                         : 3));
         EXPECT_EQ(next(), expected);
     }
     EXPECT_EQ(group.use_count(), 4) << "the first has ended";
@@ -173,7 +180,8 @@ struct ImageLoadingTest : DaemonTest {
     {
         (void)search(*connection, ++queryId, fmt::format("query {}", queryId));
         session->records.clear();
-        respond(platform::toJson(Value::Array{Dictionary{{"status", "OK"}, {"results", Value::Array{Dictionary{{"posters", images}}}}}}));
+        respond(platform::toJson(
+            Value::Array{Dictionary{{"status", "OK"}, {"results", Value::Array{Dictionary{{"posters", images}}}}}}));
     }
     std::shared_ptr<FakeCall> load(Value::Array images, std::uint64_t timeout = 1'000'000'000)
     {
@@ -221,7 +229,8 @@ struct ImageLoadingTest : DaemonTest {
 TEST_F(ImageLoadingTest, AnAnswersImagesAreFetchedAhead)
 {
     LogCapture log;
-    answerSearch(json(R"([{"url": "https://a.example/1", "id": "one"}, {"id": "two"}, {"url": "https://a.example/1"}])"));
+    answerSearch(
+        json(R"([{"url": "https://a.example/1", "id": "one"}, {"id": "two"}, {"url": "https://a.example/1"}])"));
     EXPECT_EQ(fetched(), (Strings{"https://a.example/1", "https://i.example/two", "https://i.example/one"}));
     EXPECT_EQ(fetches()[0]->originalRequest().timeout, platform::Duration(7s));
     EXPECT_EQ(device.transactions.open().at("imageFetch"), 3);
@@ -290,7 +299,8 @@ TEST_F(ImageLoadingTest, WhatIsOnItsWayIsFetchedOnce)
 TEST_F(ImageLoadingTest, OtherSchemesAreRefused)
 {
     LogCapture log;
-    answerSearch(Value::Array{image("ftp://a.example/1"), image("file://a.example/etc/passwd"), image("https://a.example/1")});
+    answerSearch(
+        Value::Array{image("ftp://a.example/1"), image("file://a.example/etc/passwd"), image("https://a.example/1")});
     EXPECT_EQ(fetched(), Strings{"https://a.example/1"});
     EXPECT_TRUE(log.has(LogLevel::Fault, "Tavrin_Images", "invalid url scheme: ftp://a.example/1"));
     EXPECT_TRUE(log.has(LogLevel::Fault, "Tavrin_Images", "invalid url scheme: file://a.example/etc/passwd"));
@@ -303,11 +313,11 @@ TEST_F(ImageLoadingTest, AClientGetsWhatIsThereInTime)
 {
     const auto begin = device.clock.hostTicks();
     auto call = load({image("https://a.example/1"), Dictionary{{"url", "https://a.example/2"}, {"id", "two"}},
-                      Dictionary{{"id", "three"}}, image("https://a.example/4"), Dictionary{{"url", "nowhere"}, {"id", "five"}},
-                      Dictionary()},
+                      Dictionary{{"id", "three"}}, image("https://a.example/4"),
+                      Dictionary{{"url", "nowhere"}, {"id", "five"}}, Dictionary()},
                      2'000'000'000);
-    EXPECT_EQ(fetched(), (Strings{"https://a.example/1", "https://a.example/2", "https://i.example/three", "https://a.example/4",
-                                  "https://i.example/two", "https://i.example/five"}));
+    EXPECT_EQ(fetched(), (Strings{"https://a.example/1", "https://a.example/2", "https://i.example/three",
+                                  "https://a.example/4", "https://i.example/two", "https://i.example/five"}));
     auto behind = load({});
     EXPECT_TRUE(behind->pending()) << "the connection's calls keep their order";
     const auto all = fetches();
@@ -354,7 +364,8 @@ TEST_F(ImageLoadingTest, WithoutABagThereAreNoImages)
     device.drain();
     ASSERT_TRUE(call->answered());
     EXPECT_EQ(call->argument(0), Value(Dictionary()));
-    assembly().clientStateManager->processImagesFromResponse(Dictionary{{"icon", image("https://a.example/1")}}, nullptr);
+    assembly().clientStateManager->processImagesFromResponse(Dictionary{{"icon", image("https://a.example/1")}},
+                                                             nullptr);
     device.drain();
     EXPECT_TRUE(fetches().empty());
 }
@@ -372,11 +383,12 @@ TEST_F(ImageLoadingTest, EveryFailureIsToldAndTheNextImageIsFetched)
         {"transport", [](Task& task) { task.fail(platform::Error::withReason("UrlErrorDomain", -1004, "refused")); },
          "Error fetching image https://a.example/0: UrlErrorDomain -1004: refused", "TAVErrorDomain",
          "image fetch error UrlErrorDomain -1004: refused"},
-        {"status", [](Task& task) { task.respond(503, "later"); }, "Bad status code 503 for image https://a.example/1", "",
-         nullptr},
+        {"status", [](Task& task) { task.respond(503, "later"); }, "Bad status code 503 for image https://a.example/1",
+         "", nullptr},
         {"no status", [](Task& task) { task.finish(platform::Bytes(), std::nullopt, std::nullopt); },
          "Bad status code 0 for image https://a.example/2", "", nullptr},
-        {"nothing in it", [](Task& task) { task.respond(200, ""); }, "mmap failed POSIX 22", "POSIX", "Invalid argument"},
+        {"nothing in it", [](Task& task) { task.respond(200, ""); }, "mmap failed POSIX 22", "POSIX",
+         "Invalid argument"},
     };
     int number = 0;
     for (const auto& c : cases) {
@@ -464,8 +476,9 @@ struct ImageFaults : ImageLoadingTest {
     {
         platform::UrlSessionConfiguration configuration;
         configuration.cache = platform::HttpCacheConfiguration{};
-        fakeSession = std::exchange(assembly().urlSession,
-                                    loader->makeSession(std::move(configuration), device.device.serialQueue("test.urlSession")));
+        fakeSession =
+            std::exchange(assembly().urlSession,
+                          loader->makeSession(std::move(configuration), device.device.serialQueue("test.urlSession")));
     }
     ~ImageFaults() override
     {
@@ -513,7 +526,8 @@ TEST_F(ImageFaults, EachLeavesItsOwnImageOut)
 
     Strings errors;
     for (const auto& record : session->records)
-        if (const auto error = std::dynamic_pointer_cast<ZRErrorFeedback>(record->feedback)) errors.push_back(error->error->reason());
+        if (const auto error = std::dynamic_pointer_cast<ZRErrorFeedback>(record->feedback))
+            errors.push_back(error->error->reason());
     EXPECT_EQ(errors.size(), 8u) << "short, reset, empty, nobody, nohttp, ftp, loop, huge";
 }
 
@@ -530,7 +544,8 @@ TEST_F(ImageFaults, WhatNeverEndsIsLeftOutAtTheLimit)
     EXPECT_EQ(bytes(*call, server.url("/good").string()), "pixels");
     EXPECT_EQ(call->argument(0).count(), 1u);
     device.advance(5min);
-    EXPECT_TRUE(device.executor.drainUntil([&] { return device.transactions.open().empty(); })) << "it is given up in the end";
+    EXPECT_TRUE(device.executor.drainUntil([&] { return device.transactions.open().empty(); }))
+        << "it is given up in the end";
 }
 
 TEST_F(ImageFaults, ManyImagesOfOneHostAllCome)

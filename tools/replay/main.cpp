@@ -61,7 +61,9 @@ public:
         : _options(options), _client(valueOf(TAVClient::connect(options.address), options.address))
     {
         _client->setTimeout(platform::durationFromSeconds(options.timeout));
-        (void)valueOf(_client->configure({options.identifier, "tavrin-replay/1"}), "configure");
+        TAVSessionConfiguration configuration(options.identifier, "tavrin-replay/1");
+        configuration.dontPreloadImages = true; // the report is about searches
+        (void)valueOf(_client->configure(configuration), "configure");
         for (int attempt = 0; attempt < 10 && !_bag; ++attempt) // each waits a second for the first one
             _bag = valueOf(_client->bag(), "the bag").bag;
         if (!_bag) fail("the daemon has no bag");

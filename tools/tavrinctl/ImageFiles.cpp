@@ -22,7 +22,8 @@ constexpr Type kTypes[]{{"png", ".png"}, {"jpeg", ".jpg"}, {"gif", ".gif"}, {"we
 
 bool isPlain(char c)
 {
-    return (c >= '0' && c <= '9') || (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || c == '.' || c == '-' || c == '_';
+    return (c >= '0' && c <= '9') || (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || c == '.' || c == '-' ||
+           c == '_';
 }
 
 } // namespace
@@ -82,7 +83,8 @@ std::filesystem::path saveImage(platform::FileSystem& files, const std::filesyst
         taken.insert(path);
         return path;
     }
-    throw Failure(fmt::format("{} has {} files of the name {}: give another with -o", directory.string(), kMostOfOneName, name));
+    throw Failure(
+        fmt::format("{} has {} files of the name {}: give another with -o", directory.string(), kMostOfOneName, name));
 }
 
 } // namespace tavrin::ctl

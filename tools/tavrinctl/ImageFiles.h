@@ -23,9 +23,9 @@ namespace tavrin::ctl {
 [[nodiscard]] std::string imageFileName(std::string_view urlOrIdentifier, std::string_view type);
 
 /// Saves an image as a new file of that name in a directory that is there, mode 0600, and answers the file. Files that
-/// are there are left as they are: one that holds these bytes already is answered as if it were new, for others the name
-/// gets a number. A name of `taken`, to which the answer is added, is left alone as well. A `Failure` where it can't be
-/// written.
+/// are there are left as they are: one that holds these bytes already is answered as if it were new, for others the
+/// name gets a number. A name of `taken`, to which the answer is added, is left alone as well. A `Failure` where it
+/// can't be written.
 [[nodiscard]] std::filesystem::path saveImage(platform::FileSystem& files, const std::filesystem::path& directory,
                                               const std::string& name, const platform::Bytes& image,
                                               std::set<std::filesystem::path>& taken);

@@ -6,9 +6,9 @@
 #include <CLI/CLI.hpp>
 #include <fmt/format.h>
 
+#include "CoreTavrin/ResponseImages.h"
 #include "CoreTavrin/TAVRequest.h"
 #include "platform/Files.h"
-#include "tavrind/ResponseImages.h"
 #include "tools/tavrinctl/Commands.h"
 #include "tools/tavrinctl/ImageFiles.h"
 #include "tools/tavrinctl/RequestRunner.h"
@@ -35,7 +35,8 @@ Value::Array wanted(const Options& options, const ImagesOptions& imagesOptions)
     if (!imagesOptions.query.empty()) {
         RequestRunner runner(options);
         const Exchange exchange = runner.run(
-            *TAVSearchRequest::searchRequestWithString(imagesOptions.query, StartSearchTrigger::NewCharacter), imagesOptions.query);
+            *TAVSearchRequest::searchRequestWithString(imagesOptions.query, StartSearchTrigger::NewCharacter),
+            imagesOptions.query);
         if (exchange.outcome() != Outcome::Answered) throw Failure("the search before it: " + summary(exchange));
         images = collectResponseImageIdentifiers(rawResponse(exchange));
         if (images.empty())
@@ -88,8 +89,7 @@ void loadImages(const Options& options, const ImagesOptions& imagesOptions)
     const auto endpoint = valueOf(TAVEndpointClient::connect(session.endpoint));
     endpoint->setTimeout(platform::durationFromSeconds(options.timeout));
     const auto begin = std::chrono::steady_clock::now();
-    const auto loaded =
-        valueOf(endpoint->loadImages(images, platform::durationFromSeconds(imagesOptions.within)));
+    const auto loaded = valueOf(endpoint->loadImages(images, platform::durationFromSeconds(imagesOptions.within)));
     const std::chrono::duration<double, std::milli> latency = std::chrono::steady_clock::now() - begin;
 
     std::set<std::filesystem::path> saved;
@@ -123,12 +123,13 @@ void loadImages(const Options& options, const ImagesOptions& imagesOptions)
                              {"bytes", bytes},
                              {"latency_ms", latency.count()}});
     else if (!saved.empty())
-        printLine(dim(fmt::format("{} of {} images, {} bytes, in {}, within {:.1f} ms", saved.size(), images.size(), bytes,
-                                  printable(directory.string()), latency.count())));
+        printLine(dim(fmt::format("{} of {} images, {} bytes, in {}, within {:.1f} ms", saved.size(), images.size(),
+                                  bytes, printable(directory.string()), latency.count())));
     if (saved.empty())
-        throw Failure(fmt::format("none of {} images came within {:g} s: the daemon's log says why (tavrind --log-level "
-                                  "info); --within gives them longer",
-                                  images.size(), imagesOptions.within));
+        throw Failure(
+            fmt::format("none of {} images came within {:g} s: the daemon's log says why (tavrind --log-level "
+                        "info); --within gives them longer",
+                        images.size(), imagesOptions.within));
 }
 
 } // namespace
@@ -139,8 +140,10 @@ void addImagesCommand(CLI::App& app, Command& chosen)
     CLI::App* command = app.add_subcommand("images", "Save the images that an answer names, as the daemon has them");
     command->add_option("query", options->query, "What to search for");
     command->add_option("--url", options->urls, "An image's URL; may be repeated");
-    command->add_option("--id", options->identifiers, "An image's identifier, for which the bag has the URL; may be repeated");
-    command->add_option("-o,--output", options->directory, "Where to save them; files that are there are left as they are")
+    command->add_option("--id", options->identifiers,
+                        "An image's identifier, for which the bag has the URL; may be repeated");
+    command
+        ->add_option("-o,--output", options->directory, "Where to save them; files that are there are left as they are")
         ->capture_default_str();
     command->add_option("--within", options->within, "Seconds in which they must be there")
         ->check(CLI::Range(0.0, 60.0))

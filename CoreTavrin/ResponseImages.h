@@ -9,8 +9,8 @@
 #include "platform/Url.h"
 #include "platform/Value.h"
 
-/// Which images an answer of the service names, and where they are. Pure functions, for answers of any shape: neither
-/// depth nor number costs stack.
+/// Which images an answer of the service names, and where they are; for the daemon, which fetches them ahead, and for
+/// clients, which ask for them. Pure functions, for answers of any shape: neither depth nor number costs stack.
 ///
 /// An image description is a dictionary with an optional "url" (an absolute URL) and an optional "id" (an identifier,
 /// which the bag turns into a URL). It stands under a key that tells its role.
@@ -28,19 +28,19 @@ void enumerateImagesInResponse(const platform::Value& object,
                                const std::function<void(const platform::Value& image)>& callback,
                                const std::set<std::string_view>& keys = imageRoleKeys());
 
-/// What identifies the images of an answer, in order: dictionaries with the "url" and "id" of each that has one. This is
-/// what `TAVEndpointXPC::loadImages` takes.
+/// What identifies the images of an answer, in order: dictionaries with the "url" and "id" of each that has one. This
+/// is what `TAVEndpointXPC::loadImages` takes.
 [[nodiscard]] platform::Value::Array collectResponseImageIdentifiers(const platform::Value& response);
 
 /// Where images are, in the order in which they are to be fetched.
 struct OrderedImages {
-    std::set<std::string> hosts;         ///< of all URLs, those seen before included
+    std::set<std::string> hosts;          ///< of all URLs, those seen before included
     std::vector<platform::Url> primary;   ///< first: the URLs that images have themselves, and those of images without
     std::vector<platform::Url> secondary; ///< then: where else images with a URL are, by their identifiers
 };
 
-/// Adds where one image is. A URL that is in `seen` is not added again, one that is added becomes part of it; null takes
-/// every URL. Anything but a dictionary is ignored, and so are URLs without a host.
+/// Adds where one image is. A URL that is in `seen` is not added again, one that is added becomes part of it; null
+/// takes every URL. Anything but a dictionary is ignored, and so are URLs without a host.
 void collectOrderedImages(const TAVBag& bag, const platform::Value& image, std::set<std::string>* seen,
                           OrderedImages& images);
 

@@ -1,4 +1,4 @@
-#include "tavrind/ResponseImages.h"
+#include "CoreTavrin/ResponseImages.h"
 
 #include "CoreTavrin/TAVBag.h"
 
@@ -24,9 +24,10 @@ struct Level {
 const std::set<std::string_view>& imageRoleKeys()
 {
     static const std::set<std::string_view> keys{
-        "thumbnail",   "image",       "image_overlay", "value_image",       "secondary_image", "icon",        "completion_icon",
-        "more_icons",  "base_icon",   "glyph",         "rt_glyph",          "title_glyph",     "more_glyphs", "more_glyphs1",
-        "more_glyphs2", "play_button", "posters",       "attribution_glyph", "badge_image"};
+        "thumbnail",   "image",           "image_overlay",     "value_image",  "secondary_image",
+        "icon",        "completion_icon", "more_icons",        "base_icon",    "glyph",
+        "rt_glyph",    "title_glyph",     "more_glyphs",       "more_glyphs1", "more_glyphs2",
+        "play_button", "posters",         "attribution_glyph", "badge_image"};
     return keys;
 }
 
