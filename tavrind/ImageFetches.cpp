@@ -15,9 +15,10 @@ bool ImageFetches::join(const platform::Url& url, const ImageGroup& group)
 
 bool ImageFetches::add(ImageFetch fetch, const ImageGroup& group)
 {
-    if (waiting() == kWaiting) return false;
+    std::deque<std::string>& turns = group ? _awaited : _ahead;
+    if (turns.size() >= kWaiting) return false;
     std::string key = fetch.url.string();
-    (group ? _awaited : _ahead).push_back(key);
+    turns.push_back(key);
     Entry& entry = _fetches.emplace(std::move(key), Entry{std::move(fetch), {}}).first->second;
     if (group) entry.groups.push_back(group);
     return true;

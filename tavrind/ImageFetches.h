@@ -32,7 +32,7 @@ class ImageFetches {
 public:
     /// Each takes a descriptor, and a connection where the service doesn't multiplex.
     static constexpr std::size_t kUnderWay = 24;
-    /// Answers may name any number of images.
+    /// Answers may name any number of images, and clients may ask for any number: so many of each may wait.
     static constexpr std::size_t kWaiting = 10'000;
 
     /// Takes part in the fetch of that URL, which moves ahead if it has to wait and `group` isn't null. False where
