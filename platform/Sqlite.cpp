@@ -13,6 +13,16 @@ namespace platform {
 
 static_assert(Sqlite::kCorrupt == SQLITE_CORRUPT);
 
+namespace {
+
+/// Of a file that others write: what a query may cost.
+constexpr int kMostSteps = 10'000'000;
+constexpr int kLongestRow = 256 << 10; // bytes
+/// How long others may keep a shared database.
+constexpr int kPatience = 1000; // milliseconds
+
+} // namespace
+
 void Sqlite::Close::operator()(sqlite3* database) const
 {
     sqlite3_close_v2(database); // once its statements are gone too
@@ -30,15 +40,17 @@ std::unexpected<Error> Sqlite::failure() const
                                              sqlite3_errmsg(_database.get())));
 }
 
-Result<Sqlite> Sqlite::open(const std::filesystem::path& path)
+Result<Sqlite> Sqlite::open(const std::filesystem::path& path, Access access)
 {
     // SQLite takes the mode of its other files from the database's, and refuses a link anywhere in the path.
     std::error_code error;
     const auto directory = std::filesystem::canonical(path.parent_path(), error);
     if (error) return std::unexpected(Error::posix(error.value(), path.parent_path().string()));
     const std::filesystem::path real = directory / path.filename();
+    const bool readOnly = access == Access::ReadOnly;
     {
-        const FileHandle file(::open(real.c_str(), O_RDWR | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, 0600));
+        const int mode = readOnly ? O_RDONLY : O_RDWR | O_CREAT;
+        const FileHandle file(::open(real.c_str(), mode | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, 0600));
         struct stat status {};
         if (!file || fstat(file.fd(), &status) != 0) return std::unexpected(Error::posix(errno, real.string()));
         if (!S_ISREG(status.st_mode)) return std::unexpected(Error::posix(EINVAL, real.string()));
@@ -46,7 +58,9 @@ Result<Sqlite> Sqlite::open(const std::filesystem::path& path)
 
     sqlite3* database = nullptr;
     const int opened = sqlite3_open_v2(real.c_str(), &database,
-                                       SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOMUTEX | SQLITE_OPEN_NOFOLLOW, nullptr);
+                                       (readOnly ? SQLITE_OPEN_READONLY : SQLITE_OPEN_READWRITE) | SQLITE_OPEN_NOMUTEX |
+                                           SQLITE_OPEN_NOFOLLOW,
+                                       nullptr);
     Sqlite result(database);
     if (opened != SQLITE_OK) {
         if (!database) return std::unexpected(Error::posix(ENOMEM, real.string()));
@@ -55,6 +69,13 @@ Result<Sqlite> Sqlite::open(const std::filesystem::path& path)
     // A file that was meddled with must not make SQLite call what we didn't mean it to.
     sqlite3_db_config(database, SQLITE_DBCONFIG_DEFENSIVE, 1, nullptr);
     sqlite3_db_config(database, SQLITE_DBCONFIG_TRUSTED_SCHEMA, 0, nullptr);
+    if (readOnly) {
+        sqlite3_limit(database, SQLITE_LIMIT_LENGTH, kLongestRow);
+        sqlite3_progress_handler(
+            database, kMostSteps, [](void*) { return 1; }, nullptr);
+    }
+    if (access == Access::Shared) sqlite3_busy_timeout(database, kPatience);
+    if (access != Access::Exclusive) return result;
     // A write-ahead log of an exclusive database needs no shared memory, and costs one sync a transaction.
     if (auto set =
             result.execute("PRAGMA locking_mode = EXCLUSIVE; PRAGMA journal_mode = WAL; PRAGMA synchronous = FULL;"

@@ -40,9 +40,16 @@ public:
         sqlite3_stmt* _statement;
     };
 
-    /// Opens or makes the file, mode 0600, which must not be a link; its directory may lie behind one. Another process
-    /// is locked out while it is open (error SQLITE_BUSY at the first access).
-    [[nodiscard]] static Result<Sqlite> open(const std::filesystem::path& path);
+    /// With whom a database is shared.
+    enum class Access {
+        Exclusive, ///< with nobody: others are locked out while it is open (error SQLITE_BUSY at the first access)
+        Shared,    ///< with others that change it; waits for them, a second at most
+        ReadOnly,  ///< with others that change it; waits for nobody, and whatever the file holds, a statement ends
+                   ///< within about a second (SQLITE_INTERRUPT) and a row has 256 KiB at most (SQLITE_TOOBIG)
+    };
+    /// Opens the file, which must not be a link; its directory may lie behind one. Makes it, mode 0600, unless it is only
+    /// to be read.
+    [[nodiscard]] static Result<Sqlite> open(const std::filesystem::path& path, Access access = Access::Exclusive);
 
     /// Runs statements without parameters and results.
     [[nodiscard]] Result<void> execute(const char* statements);

@@ -1,0 +1,312 @@
+#include "platform/PrivacyRecorder.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <random>
+
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+#include "platform/Value.h"
+#include "tests/support/ManualClock.h"
+#include "tests/support/MemoryFiles.h"
+#include "tests/support/TemporaryDirectory.h"
+
+namespace platform {
+namespace {
+
+using namespace std::chrono_literals;
+namespace fs = std::filesystem;
+using Texts = std::set<std::string>;
+
+const Date kNow = dateFromSecondsSince1970(1767225600);
+
+TEST(PrivacyLedger, ReadsBackWhatItWroteAndNothingElse)
+{
+    PrivacyLedger ledger;
+    ledger.secret.fill(0xa5);
+    ledger.debits = {{-5, 1}, {1767225600, 3}, {1767225600, 8}};
+    const std::string text = ledger.text();
+    const auto read = PrivacyLedger::parse(text);
+    ASSERT_TRUE(read) << text;
+    EXPECT_EQ(read->secret, ledger.secret);
+    EXPECT_EQ(read->debits, ledger.debits);
+
+    for (std::size_t i = 0; i < text.size(); ++i) {
+        std::string damaged = text;
+        damaged[i] ^= 1;
+        EXPECT_FALSE(PrivacyLedger::parse(damaged)) << i;
+        EXPECT_FALSE(PrivacyLedger::parse(text.substr(0, i))) << i;
+    }
+    EXPECT_FALSE(PrivacyLedger::parse(text + text));
+    // With a right digest, but not of our making.
+    using Debits = std::vector<PrivacyLedger::Debit>;
+    for (const Debits& debits : {Debits{{2, 1}, {1, 1}}, Debits{{1, 0}}, Debits{{1, -8}}, Debits{{1, 9}},
+                                 Debits{{INT64_MAX, 1}}, Debits{{INT64_MIN, 1}}}) {
+        ledger.debits = debits;
+        EXPECT_FALSE(PrivacyLedger::parse(ledger.text())) << ledger.text();
+    }
+}
+
+TEST(PrivacyLedger, AClockThatIsNeverAheadBringsNoMoreThanARightOne)
+{
+    for (unsigned seed = 0; seed < 200; ++seed) {
+        std::mt19937 random(seed);
+        const auto hours = [&](int most) { return 1h * std::uniform_int_distribution(0, most)(random); };
+        PrivacyLedger ledger;
+        int told = 0;
+        Duration passed{};
+        for (int step = 0; step < 100; ++step, passed += hours(9)) {
+            const Date clock = kNow + passed - hours(60);
+            const int wanted = std::min(std::uniform_int_distribution(0, 8)(random), ledger.left(clock));
+            if (wanted == 0) continue;
+            ledger.debit(wanted, clock);
+            told += wanted;
+            const auto days = std::chrono::floor<std::chrono::days>(passed + 60h).count();
+            ASSERT_LE(told, 8 * (days + 1)) << "seed " << seed << " step " << step;
+            ASSERT_LE(ledger.debits.size(), 8u);
+            ledger = PrivacyLedger::parse(ledger.text()).value();
+        }
+    }
+}
+
+TEST(PrivacyLedger, NoDaysTimeHasMoreThanTheBudgetHoweverTheClockLeaps)
+{
+    for (unsigned seed = 0; seed < 200; ++seed) {
+        std::mt19937 random(seed);
+        PrivacyLedger ledger;
+        std::vector<PrivacyLedger::Debit> all;
+        Date clock = kNow;
+        for (int step = 0; step < 100; ++step) {
+            clock += 1h * std::uniform_int_distribution(-30, 40)(random);
+            const int wanted = std::min(std::uniform_int_distribution(0, 8)(random), ledger.left(clock));
+            if (wanted == 0) continue;
+            ledger.debit(wanted, clock);
+            all.push_back(ledger.debits.back());
+            int inADay = 0;
+            for (const auto& debit : all) inADay += debit.at > all.back().at - 86400 ? debit.reports : 0;
+            ASSERT_LE(inADay, 8) << "seed " << seed << " step " << step;
+        }
+    }
+}
+
+struct PrivacyRecorderTest : testing::Test {
+    Result<void> record(const Texts& texts, std::string_view key = "key.app")
+    {
+        return PrivacyRecorder(files, clock, directory, random).record(key, texts);
+    }
+    /// Texts by number.
+    static Texts some(int count)
+    {
+        Texts texts;
+        for (int i = 0; i < count; ++i) texts.insert("link.example/" + std::to_string(i));
+        return texts;
+    }
+    std::string contents(const char* name)
+    {
+        return files.files.contains(directory / name) ? files.files[directory / name] : "";
+    }
+    std::size_t reports() { return parseJson(contents("reports.json")).value_or(Value()).count(); }
+    int left() { return PrivacyLedger::parse(contents("ledger")).value().left(clock.wallNow()); }
+    void pass(Duration time)
+    {
+        clock.advance(time, [] {});
+    }
+
+    test::MemoryFiles files;
+    test::ManualClock clock;
+    std::mt19937_64 engine{7};
+    RandomBytes random = [this](std::span<std::uint8_t> bytes) {
+        std::ranges::generate(bytes, [this] { return static_cast<std::uint8_t>(engine()); });
+        return true;
+    };
+    const fs::path directory = "/state/privacy";
+};
+
+TEST_F(PrivacyRecorderTest, TheBudgetIsOneForAllKeysAndComesBackADayLater)
+{
+    EXPECT_TRUE(record({}));
+    EXPECT_TRUE(files.files.empty()) << "nothing costs nothing";
+    EXPECT_TRUE(record(some(3)));
+    pass(23h);
+    EXPECT_TRUE(record(some(2), "key.other"));
+    EXPECT_EQ(reports(), 5u);
+    EXPECT_TRUE(record(some(100))) << "three of them";
+    EXPECT_EQ(reports(), 8u);
+
+    const std::string before = contents("reports.json");
+    for (const char* key : {"key.app", "key.third"}) {
+        const auto refused = record(some(1), key);
+        ASSERT_FALSE(refused);
+        EXPECT_EQ(refused.error().domain, kPrivacyErrorDomain);
+        EXPECT_EQ(refused.error().code, kPrivacyBudgetExhausted);
+    }
+    EXPECT_EQ(contents("reports.json"), before);
+    pass(1h - 1s);
+    EXPECT_FALSE(record(some(1)));
+    pass(1s);
+    EXPECT_EQ(left(), 3);
+    EXPECT_TRUE(record(some(9)));
+    EXPECT_EQ(reports(), 11u);
+}
+
+TEST_F(PrivacyRecorderTest, AClockSetBackBringsNothing)
+{
+    EXPECT_TRUE(record(some(8)));
+    for (const Duration back : {1s, 24 * 1h, 24 * 20'000h}) {
+        clock.setWall(kNow - back);
+        EXPECT_FALSE(record(some(1)));
+    }
+    clock.setWall(kNow + 24h);
+    EXPECT_TRUE(record(some(8)));
+    clock.setWall(kNow);
+    EXPECT_FALSE(record(some(1)));
+    clock.setWall(kNow + 47h);
+    EXPECT_FALSE(record(some(1)));
+}
+
+TEST_F(PrivacyRecorderTest, PaysBeforeItWrites)
+{
+    std::vector<std::string> written;
+    files.fault = [&](std::string_view operation, const fs::path& path) {
+        if (operation == "write") written.push_back(path.filename());
+        return 0;
+    };
+    ASSERT_TRUE(record(some(1)));
+    EXPECT_EQ(written, (std::vector<std::string>{"ledger", "reports.json"}));
+
+    files.fault = [](std::string_view operation, const fs::path& path) {
+        return operation == "write" && path.filename() == "reports.json" ? ENOSPC : 0;
+    };
+    EXPECT_FALSE(record(some(2)));
+    EXPECT_EQ(left(), 5) << "as if the process had been killed there";
+    EXPECT_EQ(reports(), 1u);
+
+    files.fault = [](std::string_view operation, const fs::path& path) {
+        return operation == "write" && path.filename() == "ledger" ? EIO : 0;
+    };
+    EXPECT_FALSE(record(some(2)));
+    files.fault = {};
+    EXPECT_EQ(reports(), 1u) << "nothing is told that couldn't be booked";
+    EXPECT_EQ(left(), 5);
+}
+
+TEST_F(PrivacyRecorderTest, RecordsNothingWithoutASoundLedgerOrWithoutRandomness)
+{
+    ASSERT_TRUE(record(some(2)));
+    const auto sound = files.files;
+    const auto refuses = [&](const char* why) {
+        const auto before = files.files;
+        EXPECT_FALSE(record(some(1))) << why;
+        EXPECT_EQ(files.files, before) << why;
+        files.files = sound;
+    };
+    files.files[directory / "ledger"][20] ^= 1;
+    refuses("damaged");
+    files.files[directory / "ledger"] = "";
+    refuses("empty");
+    files.files[directory / "ledger"] = std::string(1 << 20, ' ');
+    refuses("too large");
+    files.fault = [](std::string_view operation, const fs::path& path) {
+        return operation == "read" && path.filename() == "ledger" ? EACCES : 0;
+    };
+    refuses("unreadable");
+    files.fault = {};
+    const RandomBytes kept = std::exchange(random, [](std::span<std::uint8_t>) { return false; });
+    refuses("no randomness");
+    files.files.clear();
+    EXPECT_FALSE(record(some(1)));
+    EXPECT_TRUE(files.files.empty()) << "no secret that isn't one";
+    files.files = sound;
+    random = kept;
+    files.files.erase(directory / "ledger");
+    files.directories.insert(directory / "ledger");
+    EXPECT_FALSE(record(some(1))) << "a directory in its place";
+    files.directories.erase(directory / "ledger");
+    files.files = sound;
+    EXPECT_TRUE(record(some(1)));
+}
+
+TEST_F(PrivacyRecorderTest, ReportsAreKeptAMonthInNoOrderAndSayNeitherKeyNorText)
+{
+    ASSERT_TRUE(record(some(8), "key.example"));
+    const Value all = parseJson(contents("reports.json")).value();
+    std::vector<std::string> bits;
+    for (std::size_t i = 0; i < all.count(); ++i) {
+        EXPECT_EQ(all[i]["day"], Value("2026-01-01"));
+        EXPECT_EQ(all[i]["cohort"], all[0]["cohort"]);
+        EXPECT_EQ(all[i].count(), 3u);
+        bits.push_back(*all[i]["bits"].asString());
+        EXPECT_EQ(bits.back().size(), 64u);
+    }
+    EXPECT_TRUE(std::ranges::is_sorted(bits));
+    for (const auto& [path, text] : files.files) EXPECT_FALSE(text.contains("key") || text.contains("example")) << path;
+
+    pass(24h * 30);
+    ASSERT_TRUE(record(some(1)));
+    EXPECT_EQ(reports(), 9u);
+    pass(24h);
+    ASSERT_TRUE(record(some(1)));
+    EXPECT_EQ(reports(), 2u);
+
+    for (const char* broken : {"", "{}", "[", "[7]"}) {
+        pass(24h);
+        files.files[directory / "reports.json"] = broken;
+        EXPECT_TRUE(record(some(1)));
+        EXPECT_EQ(reports(), 1u) << broken;
+    }
+}
+
+TEST_F(PrivacyRecorderTest, ADeviceKeepsItsSecretAndChoosesAmongTextsByChance)
+{
+    ASSERT_TRUE(record(some(1)));
+    const auto secret = PrivacyLedger::parse(contents("ledger")).value().secret;
+    pass(24h);
+    ASSERT_TRUE(record(some(1)));
+    EXPECT_EQ(PrivacyLedger::parse(contents("ledger")).value().secret, secret);
+
+    // One of two texts, which differ in nothing but their bit: over many days each has its share.
+    const unsigned cohort = privacyCohort(secret);
+    const auto shareOf = [&](const char* text) {
+        int set = 0;
+        const unsigned bit = privacyBit(cohort, "key", text);
+        for (int day = 0; day < 400; ++day) {
+            pass(24h);
+            EXPECT_TRUE(record(some(7)));
+            files.files.erase(directory / "reports.json");
+            EXPECT_TRUE(record({"a", "b"}, "key"));
+            const Value all = parseJson(contents("reports.json")).value();
+            std::array<std::uint8_t, 32> bits{};
+            EXPECT_TRUE(readHex(*all[0]["bits"].asString(), bits));
+            set += hasBit(bits, bit);
+        }
+        return set / 400.0;
+    };
+    const bool turned = hasBit(permanentFlips(secret, "key", "a"), privacyBit(cohort, "key", "a"));
+    const bool other = hasBit(permanentFlips(secret, "key", "b"), privacyBit(cohort, "key", "a"));
+    const double expected = ((turned ? 0.25 : 0.75) + (other ? 0.75 : 0.25)) / 2;
+    EXPECT_NEAR(shareOf("a"), expected, 0.1);
+}
+
+TEST(PrivacyRecorderOnDisk, ItsFilesAreTheUsersAlone)
+{
+    test::TemporaryDirectory temporary;
+    test::ManualClock clock;
+    const auto files = makeSystemFiles();
+    const fs::path directory = temporary / "state/privacy";
+    ASSERT_TRUE(PrivacyRecorder(*files, clock, directory).record("key", {"a", "b"}));
+    for (const char* name : {"", "ledger", "reports.json"}) {
+        struct stat status {};
+        ASSERT_EQ(stat((directory / name).c_str(), &status), 0) << name;
+        EXPECT_EQ(status.st_mode & 0777, *name ? 0600u : 0700u) << name;
+    }
+    const auto first = files->read(directory / "ledger", 1 << 20).value();
+    const auto ledger = PrivacyLedger::parse(first.view()).value();
+    EXPECT_NE(ledger.secret, DeviceSecret{});
+    fs::remove(directory / "ledger");
+    fs::create_symlink(temporary / "elsewhere", directory / "ledger");
+    EXPECT_FALSE(PrivacyRecorder(*files, clock, directory).record("key", {"a"})) << "a link is not followed";
+}
+
+} // namespace
+} // namespace platform
