@@ -14,7 +14,7 @@ using platform::Value;
 const std::vector<std::string_view> kTAVResourceIdentifiers{
     "TAVAutofillTLDWhitelist", kTAVInstalledAppWhitelist, "TAVQIFeatures",    "TAVWebsiteCategoryLabels",
     kTAVLookupHintsWeekly,     kTAVLookupHintsMonthly,    "TAVVistrelModels", "TAVCorrectionDict",
-    "TAVCrowdsourcingBlacklist", "TAVCrowdsourcingWhitelist"};
+    kTAVCrowdsourcingBlacklist, kTAVCrowdsourcingWhitelist};
 
 namespace {
 

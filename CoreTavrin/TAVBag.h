@@ -70,6 +70,8 @@ private:
 inline constexpr std::string_view kTAVInstalledAppWhitelist = "TAVInstalledAppWhitelist";
 inline constexpr std::string_view kTAVLookupHintsWeekly = "TAVLookupHintsWeekly";
 inline constexpr std::string_view kTAVLookupHintsMonthly = "TAVLookupHintsMonthly";
+inline constexpr std::string_view kTAVCrowdsourcingBlacklist = "TAVCrowdsourcingBlacklist";
+inline constexpr std::string_view kTAVCrowdsourcingWhitelist = "TAVCrowdsourcingWhitelist";
 /// Identifiers of the downloadable resources, in the order in which they are processed.
 extern const std::vector<std::string_view> kTAVResourceIdentifiers;
 

@@ -25,6 +25,7 @@ class DownloadManager;
 class Lookup;
 class TAVNetworkRequestFactory;
 class TavrinBagController;
+class TavrinDPPeriodicTaskManager;
 class TavrinFeedbackFlusher;
 class TavrinFlusherXPC;
 class TavrinPersistentStorage;
@@ -69,6 +70,7 @@ struct Assembly {
     std::shared_ptr<TavrinFlusherXPC> flusherXPCListener;
     std::shared_ptr<AppWhitelistController> appWhitelistController;
     std::shared_ptr<TavrinPersistentStorage> persistentStorage;
+    std::shared_ptr<TavrinDPPeriodicTaskManager> periodicTaskManager;
 };
 
 } // namespace tavrin

@@ -17,6 +17,7 @@
 #include "tavrind/TAVNetworkRequestFactory.h"
 #include "tavrind/TavrinBagController.h"
 #include "tavrind/TavrinDPAppDeepLinkIngester.h"
+#include "tavrind/TavrinDPPeriodicTaskManager.h"
 #include "tavrind/TavrinFeedbackFlusher.h"
 #include "tavrind/TavrinPersistentStorage.h"
 #include "tavrind/TavrinService.h"
@@ -86,6 +87,7 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device)
     assembly.bagController = TavrinBagController::make(assembly);
     assembly.clientStateManager = ClientStateManager::make(assembly);
     assembly.appWhitelistController = AppWhitelistController::make(assembly);
+    assembly.periodicTaskManager = std::make_shared<TavrinDPPeriodicTaskManager>(assembly);
     daemon->deepLinkIngester = std::make_shared<TavrinDPAppDeepLinkIngester>(assembly);
     daemon->deepLinkIngester->scheduleMaintenance();
     daemon->service = TavrinService::make(assembly);

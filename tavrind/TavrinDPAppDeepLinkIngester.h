@@ -1,18 +1,42 @@
 #pragma once
 
+#include <memory>
+#include <string>
+#include <string_view>
+
+#include "platform/Date.h"
+#include "tavrind/DeepLinks.h"
+
 namespace tavrin {
 
 struct Assembly;
 
-/// Feeds deep links of applications to the privacy recorder, now and then. There is nothing to feed. Any thread.
-class TavrinDPAppDeepLinkIngester {
+/// Twice a day, while nobody uses the device, tells the privacy recorder (docs/privacy.md) which content of which
+/// applications was used in the last 24 hours.
+class TavrinDPAppDeepLinkIngester : public std::enable_shared_from_this<TavrinDPAppDeepLinkIngester> {
 public:
+    /// What the recorder's keys begin with.
+    static constexpr std::string_view appDeepLinkKey = "com.quorvane.tavrin.AppDeepLink";
+    /// Where the database of activities is, in the user's data directory.
+    static constexpr std::string_view knowledgeDirectoryPath = "com.quorvane.tavrind/knowledge";
+    /// The recorder's directory, in the user's state directory.
+    static constexpr std::string_view kRecorderDirectory = "com.quorvane.tavrind/privacy";
+
     explicit TavrinDPAppDeepLinkIngester(Assembly& assembly) : _assembly(assembly) {}
-    /// Registers the periodic tasks.
-    void scheduleMaintenance() {}
+
+    /// Registers the periodic task. Any thread.
+    void scheduleMaintenance();
+    /// Records the activities that began in that time. One call at a time.
+    void ingestStartingOn(platform::Date start, platform::Date end);
 
 private:
-    [[maybe_unused]] Assembly& _assembly;
+    void scheduleMaintenanceWithName(std::string name);
+    [[nodiscard]] DeepLinks::List _fetchCrowdsourcingWhitelist() const;
+    [[nodiscard]] DeepLinks::List _fetchCrowdsourcingBlacklist() const;
+    void _count(const FilteredDeepLinks& filtered);
+    void _record(const DeepLinkSubmission& submission, platform::Date date);
+
+    Assembly& _assembly;
 };
 
 } // namespace tavrin

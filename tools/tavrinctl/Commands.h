@@ -33,5 +33,7 @@ void addFeedbackCommands(CLI::App& app, Command& chosen);
 void addSessionCommand(CLI::App& app, Command& chosen);
 /// defaults read, write, delete and list.
 void addDefaultsCommands(CLI::App& app, Command& chosen);
+/// activity add and list.
+void addActivityCommands(CLI::App& app, Command& chosen);
 
 } // namespace tavrin::ctl

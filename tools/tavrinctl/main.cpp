@@ -35,6 +35,7 @@ int main(int argc, char** argv)
     addFeedbackCommands(app, chosen);
     addSessionCommand(app, chosen);
     addDefaultsCommands(app, chosen);
+    addActivityCommands(app, chosen);
 
     try {
         app.parse(argc, argv);

@@ -1,0 +1,163 @@
+// tavrinctl activity: what applications told of their use. Needs no daemon.
+
+#include <algorithm>
+#include <charconv>
+#include <ctime>
+
+#include <CLI/CLI.hpp>
+#include <fmt/chrono.h>
+#include <fmt/format.h>
+
+#include "platform/AppActivities.h"
+#include "platform/Files.h"
+#include "tools/tavrinctl/Commands.h"
+
+namespace tavrin::ctl {
+
+using platform::AppActivity;
+using platform::Date;
+using platform::Value;
+
+namespace {
+
+std::filesystem::path directory()
+{
+    return platform::Directories::fromEnvironment().data / "com.quorvane.tavrind" / "knowledge";
+}
+
+Date now()
+{
+    return std::chrono::time_point_cast<platform::Duration>(std::chrono::system_clock::now());
+}
+
+/// Seconds since 1970, or a date that may have a time, which may be in UTC ("Z").
+Date dateOf(const std::string& text)
+{
+    std::int64_t seconds = 0;
+    const auto number = std::from_chars(text.data(), text.data() + text.size(), seconds);
+    if (number.ec == std::errc() && number.ptr == text.data() + text.size())
+        return platform::dateFromSecondsSince1970(static_cast<double>(seconds));
+    for (const char* format :
+         {"%Y-%m-%dT%H:%M:%S", "%Y-%m-%dT%H:%M", "%Y-%m-%d %H:%M:%S", "%Y-%m-%d %H:%M", "%Y-%m-%d"}) {
+        std::tm time{};
+        time.tm_isdst = -1; // not known
+        const char* after = strptime(text.c_str(), format, &time);
+        if (!after) continue;
+        const std::string_view zone = after;
+        const int day = time.tm_mday;
+        if (zone.empty() || zone == "Z") {
+            const std::time_t when = zone.empty() ? std::mktime(&time) : timegm(&time);
+            if (time.tm_mday == day) return platform::dateFromSecondsSince1970(static_cast<double>(when));
+        }
+    }
+    throw Failure(
+        fmt::format("\"{}\" is no date; write 2026-01-31T12:00, 2026-01-31T12:00:00Z or seconds since 1970", text), 2);
+}
+
+std::string dateText(Date date)
+{
+    const auto seconds = std::chrono::floor<std::chrono::seconds>(date).time_since_epoch().count();
+    return fmt::format("{:%F %T}", fmt::localtime(static_cast<std::time_t>(seconds)));
+}
+
+Value describe(const AppActivity& activity)
+{
+    const auto text = [](const std::optional<std::string>& part) { return part ? Value(*part) : Value(); };
+    return Value::dictionaryOf(
+        {{"start", std::chrono::floor<std::chrono::seconds>(activity.start).time_since_epoch().count()},
+         {"app", activity.bundleIdentifier},
+         {"identifier", text(activity.relatedUniqueIdentifier)},
+         {"url", text(activity.contentUrl)},
+         {"public", activity.publiclyIndexable}});
+}
+
+std::string line(const AppActivity& activity)
+{
+    std::string text =
+        fmt::format("{}  {:<10}  {:<32}", dateText(activity.start),
+                    activity.publiclyIndexable ? "public" : "not public", printable(activity.bundleIdentifier));
+    for (const auto& link : {activity.relatedUniqueIdentifier, activity.contentUrl})
+        if (link) text += "  " + printable(*link);
+    return text;
+}
+
+/// Whether the text begins with a scheme (RFC 3986, 3.1).
+bool isUrl(std::string_view text)
+{
+    const auto isLetter = [](char c) { return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z'); };
+    const auto colon = text.find(':');
+    return colon != std::string_view::npos && colon > 0 && isLetter(text.front()) &&
+           std::ranges::all_of(text.substr(0, colon), [&](char c) {
+               return isLetter(c) || (c >= '0' && c <= '9') || c == '+' || c == '-' || c == '.';
+           });
+}
+
+struct ActivityOptions {
+    std::string app, url, identifier, at;
+    bool isPublic = false;
+};
+
+void add(const Options& options, const ActivityOptions& mine)
+{
+    if (mine.app.empty())
+        throw Failure("--app must not be empty: it is the application's identifier, org.example.News", 2);
+    if (!mine.url.empty() && !isUrl(mine.url))
+        throw Failure(fmt::format("\"{}\" is no URL; write https://news.example/today, or news://item/42", mine.url),
+                      2);
+    AppActivity activity{.start = mine.at.empty() ? now() : dateOf(mine.at),
+                         .bundleIdentifier = mine.app,
+                         .publiclyIndexable = mine.isPublic};
+    if (!mine.identifier.empty()) activity.relatedUniqueIdentifier = mine.identifier;
+    if (!mine.url.empty()) activity.contentUrl = mine.url;
+    if (const auto added = platform::AppActivities(directory()).add(activity, now()); !added)
+        throw Failure(fmt::format("the activity is not added: {}", added.error().reason()));
+    if (options.json) return printJson(describe(activity));
+    printLine(line(activity));
+    if (!mine.isPublic) printLine("Activities that are not public are never recorded; --public makes one that is.");
+}
+
+void list(const Options& options)
+{
+    if (!std::filesystem::exists(directory())) {
+        if (options.json) return printJson(Value::Array());
+        return printLine("No application has told anything yet; \"tavrinctl activity add\" does.");
+    }
+    auto activities =
+        platform::AppActivities(directory()).queryAppActivitiesAfterDate(Date::min(), Date::max(), SIZE_MAX);
+    if (!activities)
+        throw Failure(
+            fmt::format("the activities in {} can't be read: {}", directory().string(), activities.error().reason()));
+    if (options.limit > 0 && activities->size() > options.limit)
+        activities->erase(activities->begin(), activities->end() - static_cast<std::ptrdiff_t>(options.limit));
+    if (options.json) {
+        Value::Array all;
+        for (const AppActivity& activity : *activities) all.push_back(describe(activity));
+        return printJson(all);
+    }
+    for (const AppActivity& activity : *activities) printLine(line(activity));
+}
+
+} // namespace
+
+void addActivityCommands(CLI::App& app, Command& chosen)
+{
+    auto options = std::make_shared<ActivityOptions>();
+    CLI::App* activity = app.add_subcommand("activity", "What applications told of their use; needs no daemon");
+    activity->require_subcommand(1);
+
+    CLI::App* adding = activity->add_subcommand("add", "Tell of a use, as an application does");
+    adding->add_option("--app", options->app, "The application's identifier, org.example.News")->required();
+    adding->add_option("--url", options->url, "Where the content is");
+    adding->add_option("--identifier", options->identifier, "The content's unique identifier in the application");
+    adding->add_flag("--public,!--not-public", options->isPublic,
+                     "Whether the content is open to everyone; only then it is recorded. It isn't by default");
+    adding->add_option("--at", options->at,
+                       "When: 2026-01-31T12:00 (with \"Z\": in UTC) or seconds since 1970; now by default");
+    adding->footer("The daemon records the activities of a day twice a day, while nobody uses the device.");
+    adding->callback([&chosen, options] { chosen = [options](const Options& common) { add(common, *options); }; });
+
+    activity->add_subcommand("list", "The activities of the last days, the latest last; --limit as many")
+        ->callback([&chosen] { chosen = list; });
+}
+
+} // namespace tavrin::ctl
