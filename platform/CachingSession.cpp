@@ -20,7 +20,9 @@ void fill(HttpCache& cache, const UrlRequest& request, const Bytes& data, const 
     // After a redirect it is the answer of where that led.
     const Date received = cache.now();
     if (isStorable(request, response, received)) {
-        StoredResponse stored{{.response = response, .body = data}};
+        StoredResponse stored;
+        stored.response = response;
+        stored.body = data;
         stored.selecting = selectingFields(response, request).value_or("");
         stored.requested = requested;
         stored.received = received;

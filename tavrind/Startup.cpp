@@ -37,12 +37,19 @@ std::string caFile()
     return path ? path : "";
 }
 
-platform::UrlSessionConfiguration foregroundConfiguration(const platform::UserDefaults& userDefaults)
+platform::UrlSessionConfiguration foregroundConfiguration(const platform::Device& device)
 {
-    return {.allowFastOpenAndTickets = !userDefaults.boolean("TAVNoParallax"),
+    return {.allowFastOpenAndTickets = !device.userDefaults.boolean("TAVNoParallax"),
             .pipelining = true,
             .connectionPurgeTimeout = 10s,
-            .caFile = caFile()};
+            .caFile = caFile(),
+            .cache = platform::HttpCacheConfiguration{.memoryCapacity = 1u << 20,
+                                                      .diskCapacity = 100u << 20,
+                                                      .minimumMappedSize = 16384,
+                                                      .directory =
+                                                          device.directories.caches / "com.quorvane.tavrind" / "http",
+                                                      .queue = device.serialQueue("com.quorvane.tavrind.httpCache"),
+                                                      .clock = &device.clock}};
 }
 
 } // namespace
@@ -61,8 +68,8 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device)
     Assembly& assembly = daemon->assembly;
     const auto sessionQueue = [&](const char* label) { return device.concurrentQueue(label); };
 
-    assembly.urlSession = device.urlLoader.makeSession(foregroundConfiguration(device.userDefaults),
-                                                       sessionQueue("com.quorvane.tavrind.urlSession"));
+    assembly.urlSession =
+        device.urlLoader.makeSession(foregroundConfiguration(device), sessionQueue("com.quorvane.tavrind.urlSession"));
     assembly.requestFactory = TAVNetworkRequestFactory::make(assembly);
     assembly.subscriptionManager = TavrinSubscriptionManager::make(assembly, assembly.requestFactory);
     assembly.downloadManager = DownloadManager::make(assembly);
@@ -75,13 +82,12 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device)
     assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.launch");
     assembly.bagSession = device.urlLoader.makeSession({.connectionPurgeTimeout = 10s, .caFile = caFile()},
                                                        sessionQueue("com.quorvane.tavrind.bagSession"));
-    assembly.uploadURLSession =
-        device.backgroundSessions.make({.identifier = "com.quorvane.tavrind.flusher.nsurlsession",
-                                        .requestTimeout = 300s,
-                                        .resourceTimeout = std::chrono::days(7),
-                                        .caFile = caFile()},
-                                       assembly.backgroundFlusher,
-                                       device.serialQueue("com.quorvane.tavrind.uploadSession"));
+    assembly.uploadURLSession = device.backgroundSessions.make(
+        {.identifier = "com.quorvane.tavrind.flusher.nsurlsession",
+         .requestTimeout = 300s,
+         .resourceTimeout = std::chrono::days(7),
+         .caFile = caFile()},
+        assembly.backgroundFlusher, device.serialQueue("com.quorvane.tavrind.uploadSession"));
     assembly.backgroundFlusher->findUploads();
     assembly.lookup = Lookup::make(assembly);
     assembly.bagController = TavrinBagController::make(assembly);

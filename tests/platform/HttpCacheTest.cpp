@@ -1,0 +1,378 @@
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <csignal>
+#include <fcntl.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <fmt/format.h>
+
+#include "platform/HttpCache.h"
+#include "platform/HttpCacheStore.h"
+#include "platform/Log.h"
+#include "platform/Queue.h"
+#include "tests/support/ManualClock.h"
+#include "tests/support/ManualExecutor.h"
+#include "tests/support/TemporaryDirectory.h"
+
+namespace platform {
+namespace {
+
+namespace fs = std::filesystem;
+using namespace std::chrono_literals;
+
+Url url(int number)
+{
+    return *Url::parse(fmt::format("https://example.com/{}", number));
+}
+
+/// A cache in a directory, whose queue runs when the test says so, or when it is waited for.
+struct HttpCacheTest : testing::Test {
+    void open(std::size_t memory = 0, std::uint64_t disk = 1u << 20)
+    {
+        cache.reset();
+        cache = HttpCache::make({.memoryCapacity = memory,
+                                 .diskCapacity = disk,
+                                 .minimumMappedSize = 16384,
+                                 .directory = directory / "http",
+                                 .queue = queue,
+                                 .clock = &clock});
+    }
+    void store(int number, std::string body, HttpHeaders headers = {{"Content-Type", "image/png"}})
+    {
+        cache->store(url(number), {.url = url(number), .statusCode = 200, .headers = std::move(headers)},
+                     Bytes(std::move(body)));
+    }
+    [[nodiscard]] std::string find(int number) const
+    {
+        const auto found = cache->find(url(number));
+        return found ? std::string(found->body.view()) : "(none)";
+    }
+    [[nodiscard]] std::size_t bodyFiles() const
+    {
+        std::size_t count = 0;
+        for (const auto& entry : fs::directory_iterator(directory / "http"))
+            count += entry.path().extension() == ".body" ? 1 : 0;
+        return count;
+    }
+    [[nodiscard]] fs::path onlyBodyFile() const
+    {
+        for (const auto& entry : fs::directory_iterator(directory / "http"))
+            if (entry.path().extension() == ".body") return entry.path();
+        return {};
+    }
+    /// Every file of the directory but the lock.
+    template <class Spoil> void spoilAll(Spoil spoil) const
+    {
+        for (const auto& entry : fs::directory_iterator(directory / "http"))
+            if (entry.path().filename() != "lock") spoil(entry.path());
+    }
+
+    test::TemporaryDirectory directory;
+    test::ManualClock clock;
+    test::ManualExecutor executor;
+    std::shared_ptr<Queue> queue = Queue::make("test.httpCache", Queue::Kind::Serial, executor, clock);
+    std::vector<std::string> lines;
+    LogTap tap{[this](const LogLine& line) { lines.emplace_back(line.text); }};
+    std::shared_ptr<HttpCache> cache;
+};
+
+const std::string kSmall(1000, 's');
+const std::string kLarge(20'000, 'l');
+
+TEST_F(HttpCacheTest, AnswersAreFoundWholeAtOnceAndAfterARestart)
+{
+    open();
+    EXPECT_FALSE(fs::exists(directory / "http")) << "nothing is opened before there is need";
+    const HttpHeaders headers{{"ETag", "\"a:b\""}, {"X", ""}, {"x", " two "}};
+    store(1, kSmall, headers);
+    store(2, kLarge, headers);
+    store(3, "", headers);
+    store(4, std::string("a\0\xff\n", 4), headers);
+    for (const char* when : {"before it is written", "afterwards"}) {
+        EXPECT_EQ(find(1), kSmall) << when;
+        EXPECT_EQ(find(2), kLarge) << when;
+        EXPECT_EQ(find(3), "") << when;
+        EXPECT_EQ(find(4), std::string("a\0\xff\n", 4)) << when;
+        EXPECT_EQ(find(5), "(none)") << when;
+    }
+    EXPECT_EQ(bodyFiles(), 1u) << "small ones are in the index";
+    open();
+    const auto found = cache->find(*Url::parse(url(2).string() + "#part"));
+    ASSERT_TRUE(found);
+    EXPECT_EQ(found->body.view(), kLarge);
+    EXPECT_EQ(found->response.statusCode, 200);
+    EXPECT_EQ(found->response.url, url(2));
+    EXPECT_EQ(found->response.headers, headers);
+    EXPECT_EQ(find(1), kSmall);
+
+    store(2, "replaced");
+    EXPECT_EQ(find(2), "replaced");
+    EXPECT_EQ(bodyFiles(), 0u);
+    EXPECT_EQ(found->body.view(), kLarge) << "who holds the old one keeps it";
+    cache->remove(url(1));
+    EXPECT_EQ(find(1), "(none)");
+    open();
+    EXPECT_EQ(find(1), "(none)");
+    EXPECT_EQ(find(2), "replaced");
+
+    struct stat status {};
+    ASSERT_EQ(stat((directory / "http").c_str(), &status), 0);
+    EXPECT_EQ(status.st_mode & 0777, 0700u);
+    ASSERT_EQ(stat((directory / "http/index.db").c_str(), &status), 0);
+    EXPECT_EQ(status.st_mode & 0777, 0600u);
+}
+
+TEST_F(HttpCacheTest, MemoryAnswersWithoutTheDiskAndGivesUpWhatWasUsedLeast)
+{
+    cache = HttpCache::make({.memoryCapacity = 100'000});
+    for (int i = 0; i < 12; ++i) {
+        store(i, std::string(8000, static_cast<char>('a' + i)));
+        (void)find(0);
+    }
+    EXPECT_EQ(find(0), std::string(8000, 'a')) << "used all the time";
+    EXPECT_EQ(find(1), "(none)");
+    EXPECT_EQ(find(11), std::string(8000, 'l'));
+    store(11, std::string(20'000, 'x'));
+    EXPECT_EQ(find(11), "(none)") << "more than a tenth; and the one before is outdated";
+    store(3, "short");
+    EXPECT_EQ(find(3), "short");
+}
+
+TEST_F(HttpCacheTest, TheDiskGivesUpWhatWasUsedLeastAlsoAfterARestart)
+{
+    constexpr std::uint64_t kCapacity = 250'000; // for 11 of them
+    open(0, kCapacity);
+    for (int i = 0; i < 10; ++i) store(i, kLarge);
+    EXPECT_EQ(find(0), kLarge);
+    open(0, kCapacity);
+    for (int i = 10; i < 14; ++i) store(i, kLarge);
+    EXPECT_EQ(find(0), kLarge) << "used before the restart";
+    EXPECT_EQ(find(1), "(none)");
+    EXPECT_EQ(find(13), kLarge);
+    EXPECT_LE(bodyFiles() * kLarge.size(), kCapacity);
+    EXPECT_GE(bodyFiles(), 10u) << "no more than had to";
+    store(13, std::string(26'000, 'x'));
+    EXPECT_EQ(find(13), "(none)") << "more than a tenth; and the one before is outdated";
+}
+
+TEST_F(HttpCacheTest, UsesInMemoryCountOnDisk)
+{
+    open(1u << 20, 250'000);
+    for (int i = 0; i < 40; ++i) {
+        store(i, kLarge);
+        EXPECT_EQ(find(0), kLarge);
+    }
+    executor.drain();
+    open(0, 250'000);
+    EXPECT_EQ(find(0), kLarge);
+    EXPECT_EQ(find(20), "(none)");
+}
+
+TEST_F(HttpCacheTest, LookUpsQueueBehindWhatIsBeingWrittenAndAskTheDiskOnlyWhereTheyMust)
+{
+    open();
+    std::string seen;
+    const auto lookUp = [&](int number) {
+        cache->lookUp(url(number), [&](auto found) { seen += found ? found->body.view().substr(0, 3) : "-"; });
+    };
+    lookUp(1);
+    EXPECT_EQ(seen, "") << "nobody knows yet what is on the disk";
+    executor.drain();
+    EXPECT_EQ(seen, "-");
+    lookUp(1);
+    EXPECT_EQ(seen, "--") << "it is known to be nowhere";
+    store(1, "one");
+    lookUp(1);
+    store(1, "two");
+    lookUp(1);
+    cache->remove(url(1));
+    lookUp(1);
+    EXPECT_EQ(seen, "--");
+    executor.drain();
+    EXPECT_EQ(seen, "--onetwo-");
+
+    open(1u << 20);
+    store(1, "memory");
+    lookUp(1);
+    EXPECT_EQ(seen, "--onetwo-mem") << "at once";
+}
+
+TEST_F(HttpCacheTest, NothingOutdatedComesFromTheDiskIntoMemory)
+{
+    open();
+    store(1, "old");
+    open(1u << 20);
+    std::string seen;
+    cache->lookUp(url(1), [&](auto found) { seen = found->body.view(); });
+    store(1, "new");
+    cache->remove(url(1));
+    executor.drain();
+    EXPECT_EQ(seen, "old");
+    EXPECT_EQ(find(1), "(none)");
+}
+
+TEST_F(HttpCacheTest, ASecondProcessRunsWithoutTheDisk)
+{
+    open();
+    store(1, kLarge);
+    executor.drain();
+    const auto first = std::exchange(cache, nullptr);
+    open(1u << 20);
+    EXPECT_EQ(find(1), "(none)");
+    store(2, "in memory");
+    executor.drain();
+    EXPECT_EQ(find(2), "in memory");
+    EXPECT_TRUE(first->find(url(1)));
+    EXPECT_EQ(std::ranges::count_if(lines, [](const auto& line) { return line.contains("can't be used"); }), 1);
+}
+
+TEST_F(HttpCacheTest, DamageIsDroppedAndNeverAnswered)
+{
+    const struct {
+        const char* what;
+        void (*spoil)(const fs::path&);
+    } cases[]{
+        {"cut off", [](const fs::path& path) { (void)truncate(path.c_str(), 100); }},
+        {"empty", [](const fs::path& path) { (void)truncate(path.c_str(), 0); }},
+        {"gone", [](const fs::path& path) { fs::remove(path); }},
+        {"overwritten",
+         [](const fs::path& path) {
+             const FileHandle file(::open(path.c_str(), O_WRONLY));
+             for (off_t at = 64; at < static_cast<off_t>(fs::file_size(path)); at += 128)
+                 EXPECT_EQ(pwrite(file.fd(), "!?", 2, at), 2);
+         }},
+        {"directories",
+         [](const fs::path& path) {
+             fs::remove(path);
+             fs::create_directory(path);
+         }},
+        {"links",
+         [](const fs::path& path) {
+             fs::remove(path);
+             fs::create_symlink("/dev/zero", path);
+         }},
+    };
+    for (const auto& c : cases) {
+        for (const bool running : {true, false}) {
+            SCOPED_TRACE(fmt::format("{}, {}", c.what, running ? "running" : "restarted"));
+            open();
+            store(1, kSmall);
+            store(2, kLarge);
+            executor.drain();
+            if (!running) cache.reset();
+            spoilAll(c.spoil);
+            if (!running) open();
+            for (const int number : {1, 2}) {
+                const std::string found = find(number);
+                EXPECT_TRUE(found == "(none)" || found == (number == 1 ? kSmall : kLarge));
+            }
+            EXPECT_NE(find(2), kLarge) << "its file is spoilt, whatever the index says";
+            store(3, "goes on");
+            executor.drain();
+            cache.reset();
+            fs::remove_all(directory / "http");
+        }
+    }
+}
+
+TEST_F(HttpCacheTest, OneDamagedBodyCostsNoOther)
+{
+    open();
+    store(1, kLarge);
+    executor.drain();
+    const fs::path spoilt = onlyBodyFile();
+    store(2, kLarge);
+    executor.drain();
+    {
+        const FileHandle file(::open(spoilt.c_str(), O_WRONLY));
+        ASSERT_EQ(pwrite(file.fd(), "x", 1, 12'345), 1);
+    }
+    EXPECT_EQ(find(1), "(none)");
+    EXPECT_FALSE(fs::exists(spoilt));
+    EXPECT_EQ(find(2), kLarge);
+    EXPECT_TRUE(std::ranges::any_of(lines, [](const auto& line) { return line.contains("damaged"); }));
+
+    test::writeFile(directory / "http/99.body", "of nobody");
+    test::writeFile(directory / "http/new", "half-writ");
+    open();
+    EXPECT_EQ(find(2), kLarge);
+    EXPECT_FALSE(fs::exists(directory / "http/99.body"));
+    EXPECT_FALSE(fs::exists(directory / "http/new"));
+}
+
+TEST_F(HttpCacheTest, ADirectoryThatWasTakenAwayIsMadeAnew)
+{
+    open();
+    store(1, kLarge);
+    executor.drain();
+    fs::remove_all(directory / "http");
+    EXPECT_EQ(find(1), "(none)");
+    store(2, kLarge);
+    EXPECT_EQ(find(2), kLarge);
+    EXPECT_EQ(bodyFiles(), 1u);
+    open();
+    EXPECT_EQ(find(2), kLarge);
+
+    // Something else in its place; and a minute after that has gone it is in use again.
+    cache.reset();
+    fs::remove_all(directory / "http");
+    test::writeFile(directory / "http", "a file");
+    open();
+    store(3, kLarge);
+    EXPECT_EQ(find(3), "(none)");
+    fs::remove(directory / "http");
+    store(3, kLarge);
+    EXPECT_EQ(find(3), "(none)") << "not tried again at once";
+    clock.advance(61s, [] {});
+    store(3, kLarge);
+    EXPECT_EQ(find(3), kLarge);
+}
+
+TEST_F(HttpCacheTest, AFullDiskKeepsWhatIsThere)
+{
+    open();
+    store(1, kLarge);
+    store(2, kSmall);
+    executor.drain();
+    // The process may write no file beyond the index's size: the next large body fails as on a full disk.
+    rlimit before{};
+    ASSERT_EQ(getrlimit(RLIMIT_FSIZE, &before), 0);
+    const auto oldHandler = signal(SIGXFSZ, SIG_IGN);
+    rlimit limit = before;
+    limit.rlim_cur = 10'000;
+    ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &limit), 0);
+    store(1, std::string(30'000, 'n'));
+    store(3, kLarge);
+    executor.drain();
+    ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &before), 0);
+    signal(SIGXFSZ, oldHandler);
+
+    EXPECT_NE(find(1), kLarge) << "an answer that was replaced is no longer true";
+    EXPECT_EQ(find(3), "(none)");
+    EXPECT_EQ(find(2), kSmall);
+    store(3, kLarge);
+    EXPECT_EQ(find(3), kLarge);
+    EXPECT_TRUE(std::ranges::any_of(lines, [](const auto& line) { return line.contains("can't be used"); }));
+}
+
+TEST_F(HttpCacheTest, AnIndexOfOtherTablesIsBegunAnew)
+{
+    fs::create_directories(directory / "http");
+    {
+        auto index = Sqlite::open(directory / "http/index.db");
+        ASSERT_TRUE(index);
+        ASSERT_TRUE(
+            index->execute("CREATE TABLE entry (id INTEGER PRIMARY KEY, key TEXT); INSERT INTO entry VALUES (1, 'x')"));
+    }
+    open();
+    EXPECT_EQ(find(1), "(none)");
+    store(1, kSmall);
+    open();
+    EXPECT_EQ(find(1), kSmall);
+}
+
+} // namespace
+} // namespace platform
