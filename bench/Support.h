@@ -157,6 +157,7 @@ private:
 [[nodiscard]] std::vector<Row> waiters();
 [[nodiscard]] std::vector<Row> idle();
 [[nodiscard]] std::vector<Row> cacheTree();
+[[nodiscard]] std::vector<Row> httpCache();
 [[nodiscard]] std::vector<Row> signature();
 [[nodiscard]] std::vector<Row> lookupFilter();
 [[nodiscard]] std::vector<Row> append();

@@ -28,6 +28,7 @@ int main(int argc, char** argv)
                        {"waiters", waiters},
                        {"idle", idle},
                        {"tree", cacheTree},
+                       {"http", httpCache},
                        {"signature", signature},
                        {"filter", lookupFilter},
                        {"append", append},

@@ -273,7 +273,11 @@ Result<std::shared_ptr<const StoredResponse>> HttpCacheStore::find(const std::st
                                   .digest = found.integer(8)};
                         if (!found.isNull(9)) row->body = text(9);
                     });
-    if (!read) return std::unexpected(std::move(read.error()));
+    if (!read) {
+        // A file that became shorter than its index says.
+        if (read.error().code == SQLITE_IOERR) return std::unexpected(damaged("the index can't be read"));
+        return std::unexpected(std::move(read.error()));
+    }
     if (!row) return nullptr;
 
     const bool mapped = !row->body;

@@ -66,8 +66,10 @@ struct HttpCacheTest : testing::Test {
     /// Every file of the directory but the lock.
     template <class Spoil> void spoilAll(Spoil spoil) const
     {
+        std::vector<fs::path> files;
         for (const auto& entry : fs::directory_iterator(directory / "http"))
-            if (entry.path().filename() != "lock") spoil(entry.path());
+            if (entry.path().filename() != "lock") files.push_back(entry.path());
+        for (const fs::path& file : files) spoil(file);
     }
 
     test::TemporaryDirectory directory;

@@ -1,0 +1,122 @@
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <unistd.h>
+
+#include "fuzz/Check.h"
+#include "platform/HttpCachePolicy.h"
+#include "platform/HttpCacheStore.h"
+#include "tests/support/TemporaryDirectory.h"
+
+using namespace platform;
+
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr HttpCacheStore::Limits kLimits{.capacity = 1u << 20, .minimumMappedSize = 64};
+const Date kNow = dateFromSecondsSince1970(1767225600);
+
+UrlRequest requestFor(const std::string& key)
+{
+    return {.url = *Url::parse(key)};
+}
+
+StoredResponse answerFor(const std::string& key, std::size_t size)
+{
+    StoredResponse stored;
+    stored.response = {
+        .url = *Url::parse(key), .statusCode = 200, .headers = {{"Cache-Control", "max-age=60"}, {"ETag", "\"1\""}}};
+    stored.body = Bytes(std::string(size, 'b'));
+    stored.requested = stored.received = kNow;
+    return stored;
+}
+
+/// The rules must have an answer for whatever a service says, and keep to it.
+void judge(HttpHeaders headers)
+{
+    const UrlRequest plain = requestFor("http://a/");
+    UrlRequest request = plain;
+    request.headers = headers;
+    StoredResponse stored = answerFor("http://a/", 4);
+    stored.response.headers = headers;
+    (void)cacheUse(request);
+    const auto fields = selectingFields(stored.response, request);
+    const auto lifetime = freshnessLifetime(stored.response, kNow);
+    check(lifetime.count() >= 0 && currentAge(stored, kNow).count() >= 0);
+    if (!fields) {
+        check(!isStorable(request, stored.response, kNow));
+        return;
+    }
+    stored.selecting = *fields;
+    const bool answered = reuse(stored, request, kNow) == Reuse::Answer;
+    check(!answered || lifetime > currentAge(stored, kNow));
+    const UrlResponse notModified{.url = plain.url, .statusCode = 304, .headers = std::move(headers)};
+    (void)confirmationRequest(stored, plain);
+    (void)confirms(notModified, stored);
+    check(confirmed(stored, notModified, kNow, kNow).body == stored.body);
+}
+
+/// What was kept is found as it was, or not at all; and a cache that was opened works.
+void use(const fs::path& directory)
+{
+    auto store = HttpCacheStore::open(directory, kLimits);
+    check(store.has_value(), store ? "" : store.error().description());
+    (void)(*store)->keys();
+    for (const std::size_t size : {10u, 100u}) {
+        const std::string key = "http://a/" + std::to_string(size);
+        const auto found = (*store)->find(key);
+        if (found && *found)
+            check((*found)->body == answerFor(key, size).body && (*found)->response.headers.size() == 2, key);
+        if (!found && HttpCacheStore::isDamage(found.error())) check((*store)->beginAnew().has_value());
+        auto kept = (*store)->put(key, answerFor(key, size));
+        if (!kept) {
+            const auto begun = (*store)->beginAnew();
+            check(begun.has_value(), kept.error().description());
+            kept = (*store)->put(key, answerFor(key, size));
+            check(kept.has_value(), kept ? "" : kept.error().description());
+        }
+        const auto again = (*store)->find(key);
+        check((again && *again && (*again)->body.size() == size) ||
+              (!again && HttpCacheStore::isDamage(again.error())));
+    }
+}
+
+} // namespace
+
+/// The input is a service's header fields, line by line, and a whole index. If it begins with "~" it is changes to a
+/// sound index: the offset in two bytes, and the byte's new value.
+int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
+{
+    const std::string_view input = textOf(data, size);
+    const test::TemporaryDirectory directory;
+    std::string index(input);
+    if (input.starts_with("~")) {
+        {
+            auto store = HttpCacheStore::open(directory.path, kLimits).value();
+            for (const std::size_t body : {10u, 100u}) {
+                const std::string key = "http://a/" + std::to_string(body);
+                check(store->put(key, answerFor(key, body)).has_value());
+            }
+        }
+        std::ifstream file(directory / "index.db", std::ios::binary);
+        index.assign(std::istreambuf_iterator<char>(file), {});
+        for (std::size_t i = 1; i + 3 <= size; i += 3)
+            index[(data[i] << 8 | data[i + 1]) % index.size()] = input[i + 2];
+    } else {
+        HttpHeaders headers;
+        std::string_view rest = input;
+        while (!rest.empty()) {
+            const std::string_view line = rest.substr(0, rest.find('\n'));
+            rest.remove_prefix(std::min(rest.size(), line.size() + 1));
+            const auto colon = line.find(':');
+            // As the loader hands them on, without NUL.
+            if (colon != std::string_view::npos && !line.contains('\0'))
+                headers.add(std::string(line.substr(0, colon)), std::string(line.substr(colon + 1)));
+        }
+        judge(std::move(headers));
+    }
+    test::writeFile(directory / "index.db", index);
+    use(directory.path);
+    return 0;
+}
