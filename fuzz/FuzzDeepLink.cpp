@@ -1,4 +1,5 @@
 #include <algorithm>
+#include <set>
 
 #include "fuzz/Check.h"
 #include "platform/Text.h"

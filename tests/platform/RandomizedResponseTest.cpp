@@ -1,6 +1,7 @@
 #include "platform/RandomizedResponse.h"
 
 #include <algorithm>
+#include <array>
 #include <bit>
 #include <cmath>
 #include <cstdlib>
