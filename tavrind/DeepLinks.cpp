@@ -1,6 +1,7 @@
 #include "tavrind/DeepLinks.h"
 
 #include <algorithm>
+#include <random>
 
 #include "platform/Text.h"
 #include "platform/Url.h"
@@ -176,10 +177,9 @@ std::vector<std::string> DeepLinks::recordingOrder(const DeepLinkSubmission& sub
     for (const auto& [identifier, links] : submission) order.push_back(identifier);
     if (order.empty()) return order;
     const auto halfDay = std::chrono::floor<std::chrono::hours>(date).time_since_epoch() / std::chrono::hours(12);
-    // Multiples of the golden ratio spread evenly, also where every second run is missed.
-    constexpr std::uint64_t kGolden = 0x9e3779b97f4a7c15;
-    const std::uint64_t spread = static_cast<std::uint64_t>(halfDay) * kGolden >> 32;
-    std::ranges::rotate(order, order.begin() + static_cast<std::ptrdiff_t>(spread % order.size()));
+    // By chance that is the same for everyone who asks: no rhythm of runs meets always the same application.
+    std::mt19937_64 chance(static_cast<std::uint64_t>(halfDay));
+    std::ranges::rotate(order, order.begin() + static_cast<std::ptrdiff_t>(chance() % order.size()));
     return order;
 }
 
