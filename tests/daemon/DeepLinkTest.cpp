@@ -131,7 +131,7 @@ TEST(DeepLink, EveryApplicationIsTheFirstToBeRecordedAtTimesHoweverRunsAreMissed
             EXPECT_EQ(std::set(order.begin(), order.end()).size(), 6u);
             ++first[order.front()];
         }
-        for (const auto& [app, links] : submission) EXPECT_GE(first[app], 3) << app << " every " << stride;
+        for (const auto& [app, links] : submission) EXPECT_GE(first[app], 2) << app << " every " << stride;
     }
     EXPECT_EQ(DeepLinks::recordingOrder(submission, platform::Date(-100h)).size(), 6u);
 }
