@@ -51,6 +51,11 @@ std::string textOf(const platform::HttpHeaders& headers)
     return text;
 }
 
+void logTaskError(const std::string& reason)
+{
+    log().error("download task error {}", makeTAVError(TAVErrorInvalidResponse, reason).description());
+}
+
 /// The list of a session's tasks, on its way.
 struct TaskList {
     platform::Event arrived;
@@ -201,9 +206,15 @@ void DownloadManager::_addResource(const std::string& identifier, const std::opt
         _pending.erase(identifier);
         return;
     }
-    if (!_pending.insert_or_assign(identifier, *url).second) return;
-    _queue->after(_delay(), [weak = weak_from_this(), identifier] {
-        if (const auto self = weak.lock()) self->_startPending(identifier);
+    if (const auto pending = _pending.find(identifier); pending != _pending.end()) {
+        *pending->second = *url;
+        return;
+    }
+    const auto pending = std::make_shared<Url>(*url);
+    _pending.emplace(identifier, pending);
+    _queue->after(_delay(), [weak = weak_from_this(), identifier, awaited = std::weak_ptr(pending)] {
+        const auto self = weak.lock();
+        if (self && !awaited.expired()) self->_startPending(identifier);
     });
 }
 
@@ -213,8 +224,9 @@ void DownloadManager::_startPending(const std::string& identifier)
     const auto found = _resources.find(identifier);
     if (!pending || found == _resources.end()) return;
     if (!_isAllowed(identifier)) return log().log("{} is disabled, not downloading", identifier);
-    if (const auto reason = downloadReason(found->second, pending.mapped(), _fileExists(identifier)))
-        _downloadResource(found->second, pending.mapped(), *reason);
+    const Url& url = *pending.mapped();
+    if (const auto reason = downloadReason(found->second, url, _fileExists(identifier)))
+        _downloadResource(found->second, url, *reason);
 }
 
 void DownloadManager::_downloadResource(const DownloadResource& resource, const Url& url, std::string_view reason)
@@ -328,9 +340,10 @@ void DownloadManager::_noteReceived(const std::string& identifier, const Value& 
 {
     _queue->assertOnQueue();
     const auto found = _resources.find(identifier);
-    if (found == _resources.end()) // no longer in the bag, or to be fetched anew
-        return log().error("could not find resource for download identifier: {} url: {}", identifier,
-                           request.url.string());
+    if (found == _resources.end()) { // no longer in the bag, or to be fetched anew
+        log().error("could not find resource for download identifier: {} url: {}", identifier, request.url.string());
+        return logTaskError(fmt::format("can't find {}", identifier));
+    }
     DownloadResource& resource = found->second;
     resource.url = note.asString() ? Url::parse(*note.asString()) : std::nullopt;
     resource.redirectUrl = response.url == request.url ? std::nullopt : std::optional(response.url);
@@ -346,15 +359,15 @@ void DownloadManager::taskDidComplete(const std::shared_ptr<platform::Background
     if (error && error->code == platform::kUrlCancelled) return;
     std::string reason;
     if (error)
-        reason = fmt::format("download error {} {}", error->description(), error->code);
+        reason = fmt::format("download error {} of {} {}", error->description(), task->originalRequest().url.string(),
+                             error->code);
     else if (!response || response->url.empty())
         return log().error("task completed with nil url and error: {}", "none");
     else if (response->statusCode != 200 && response->statusCode != 304)
         reason = fmt::format("status code {}", response->statusCode);
     else
         return; // noted with the file
-    log().error("download task error {} url: {}", makeTAVError(TAVErrorInvalidResponse, reason).description(),
-                task->originalRequest().url.string());
+    logTaskError(reason);
 }
 
 } // namespace tavrin

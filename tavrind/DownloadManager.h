@@ -104,7 +104,9 @@ private:
     Assembly& _assembly;
     const std::shared_ptr<platform::Queue> _queue; // guards all below but the flag and the observers
     DownloadResources _resources;
-    std::map<std::string, platform::Url> _pending; // downloads whose 60 s run
+    /// Downloads whose delay runs, each with the URL that it will have by then. Its timer knows it by the pointer, so
+    /// that one that was called off doesn't begin the next.
+    std::map<std::string, std::shared_ptr<platform::Url>> _pending;
     std::weak_ptr<LookupResources> _lookupResources;
     std::atomic<bool> _started = false;
     platform::NotificationCenter::Token _bagObserver;

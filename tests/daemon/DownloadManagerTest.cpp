@@ -265,6 +265,15 @@ TEST_F(DownloadManagerTest, BagsInQuickSuccessionLeadToOneDownloadOfTheLast)
     ASSERT_EQ(tasks().size(), 2u);
     deliver(200, "three");
     EXPECT_EQ(contents("TAVQIFeatures"), "three");
+
+    bag({{"TAVQIFeatures", "https://r.example/f?version=4"}});
+    device.advance(30s);
+    bag({});
+    bag({{"TAVQIFeatures", "https://r.example/f?version=4"}});
+    device.advance(59s);
+    EXPECT_EQ(tasks().size(), 2u) << "the delay that was called off is over, the other isn't";
+    device.advance(1s);
+    EXPECT_EQ(tasks().size(), 3u);
 }
 
 TEST_F(DownloadManagerTest, WhatTheBagNoLongerListsIsDeleted)
@@ -363,7 +372,6 @@ TEST_F(DownloadManagerTest, TheDelayCanBeShortenedForDevelopment)
         device.advance(59s);
         EXPECT_TRUE(tasks().empty()) << platform::toJson(wrong);
         bag({});
-        device.advance(1s);
     }
     device.userDefaults.set("TAVDownloadDelay", 2);
     bag({{"TAVQIFeatures", "https://r.example/f"}});
