@@ -90,7 +90,10 @@ void TavrinSubscriptionManager::_updateSubscriptions()
     log().info("updating subscriptions");
     const auto domains = _bag ? _bag->subscriptionProviderDomainWhitelist() : std::nullopt;
     const auto bundles = _bag ? _bag->subscriptionProviderBundleIdentifierWhitelist() : std::nullopt;
-    if (!domains || !bundles) return _setSubscriptions({});
+    if (!domains || !bundles) {
+        _subscriptionsByProvider.clear();
+        return _updateDelegate();
+    }
 
     auto services = _assembly.device.subscriptions.activeServices(
         {.bundleIdentifiers = *bundles,
