@@ -95,7 +95,7 @@ TEST(Text, SearchesAsIcuDoes)
     const auto some = [&](std::size_t most) {
         std::u16string text;
         for (std::size_t length = 1 + below(most); length > 0; --length) text += characters[below(characters.size())];
-        return icu::UnicodeString(text);
+        return icu::UnicodeString(text.data(), static_cast<int32_t>(text.size()));
     };
     int found = 0, missed = 0;
     for (const char* locale : {"en_US", "de_CH", "sk_SK", "th_TH", "ca_ES", "tr_TR", "ja_JP", "vi_VN"}) {
