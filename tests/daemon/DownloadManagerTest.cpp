@@ -80,6 +80,7 @@ struct DownloadManagerTest : testing::Test {
         device.drain();
     }
 
+    auto& tasks() { return device.background.sessions.at("com.quorvane.tavrind")->tasks; }
     /// Another process, whose session takes up what is under way.
     void restart()
     {
@@ -97,7 +98,6 @@ struct DownloadManagerTest : testing::Test {
              .userInfo = {{"bag", std::make_shared<const TAVBag>(std::move(resources), "Vistrel/4")}}});
         device.drain();
     }
-    auto& tasks() { return device.background.sessions.at("com.quorvane.tavrind")->tasks; }
     /// A bag that lists one resource, and the download that it leads to.
     auto download(const std::string& identifier, std::string url)
     {
