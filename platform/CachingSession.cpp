@@ -32,6 +32,16 @@ void fill(HttpCache& cache, const UrlRequest& request, const Bytes& data, const 
     }
 }
 
+/// Bytes that depend on no file: nobody knows how long the task's owner, or a confirmation, keeps them.
+Stored inMemory(Stored stored)
+{
+    if (!stored->mapped) return stored;
+    auto copy = std::make_shared<StoredResponse>(*stored);
+    copy->body = Bytes(std::string(stored->body.view()));
+    copy->mapped = false;
+    return copy;
+}
+
 /// When an answer from the cache was asked for and there.
 Value timingFromCache(double start)
 {
@@ -110,6 +120,7 @@ private:
     void lookedUp(Stored stored)
     {
         const Reuse worth = stored ? reuse(*stored, _request, _cache->now()) : Reuse::None;
+        if (worth != Reuse::None) stored = inMemory(std::move(stored));
         if (worth == Reuse::Answer) return end(stored->body, stored->response, std::nullopt, timingFromCache(_start));
         _stored = std::move(stored);
         _confirming = worth == Reuse::Confirm;
@@ -180,6 +191,7 @@ private:
             _timing = std::move(timing);
             self = std::move(_self);
         }
+        _stored.reset();
         auto completion = std::exchange(_completion, {});
         completion(std::move(data), std::move(response), std::move(error));
     }

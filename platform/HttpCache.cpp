@@ -23,6 +23,8 @@ using Stored = std::shared_ptr<const StoredResponse>;
 constexpr Duration kRetryDelay = std::chrono::minutes(1);
 /// One answer gets this part of a capacity at most, lest it drive all others out.
 constexpr std::size_t kLargestPart = 10;
+/// Bytes of what waits to be written, lest a slow disk fill the memory: what comes meanwhile isn't kept on disk.
+constexpr std::size_t kMostWaiting = 64u << 20;
 
 std::size_t sizeOf(const std::string& key, const StoredResponse& stored)
 {
@@ -92,7 +94,7 @@ private:
 } // namespace
 
 /// The order of the disk's changes is that of the calls, for each is queued under the mutex. Memory is ahead of the
-/// disk by those that wait; nothing is taken from the disk into memory meanwhile, since it may be outdated.
+/// disk by those that wait; what they are about isn't taken from the disk into memory, since it may be outdated.
 struct HttpCache::Impl : std::enable_shared_from_this<Impl> {
     explicit Impl(HttpCacheConfiguration configuration_)
         : configuration(std::move(configuration_)), memory(configuration.memoryCapacity)
@@ -113,27 +115,22 @@ struct HttpCache::Impl : std::enable_shared_from_this<Impl> {
 
     void put(std::string key, StoredResponse stored)
     {
-        // Whoever keeps a mapping depends on a file; in memory a copy is kept.
-        const bool forMemory = stored.body.size() < configuration.memoryCapacity / kLargestPart;
-        if (std::exchange(stored.mapped, false) && forMemory) stored.body = Bytes(std::string(stored.body.view()));
-        const bool forDisk = hasDisk() && stored.body.size() < configuration.diskCapacity / kLargestPart;
         const Stored shared = std::make_shared<const StoredResponse>(std::move(stored));
 
         std::lock_guard lock(mutex);
         memory.put(key, shared);
         if (!hasDisk()) return;
-        if (onDisk && forDisk) onDisk->insert(hash(key));
-        change([self = shared_from_this(), key = std::move(key), shared, forDisk] {
-            forDisk ? self->writeToDisk(key, *shared) : self->removeFromDisk(key);
-        });
+        const std::size_t size = sizeOf(key, *shared);
+        if (shared->body.size() >= configuration.diskCapacity / kLargestPart || waitingBytes + size > kMostWaiting)
+            return removeBehind(std::move(key));
+        change(hash(key), size, [self = shared_from_this(), key, shared] { self->writeToDisk(key, *shared); });
     }
 
     void remove(std::string key)
     {
         std::lock_guard lock(mutex);
         memory.remove(key);
-        if (hasDisk() && mayBeOnDisk(key))
-            change([self = shared_from_this(), key = std::move(key)] { self->removeFromDisk(key); });
+        if (hasDisk()) removeBehind(std::move(key));
     }
 
     const HttpCacheConfiguration configuration;
@@ -144,16 +141,32 @@ private:
 
     // Under the mutex.
 
-    [[nodiscard]] bool mayBeOnDisk(const std::string& key) const { return !onDisk || onDisk->contains(hash(key)); }
-    /// Queues a change of what is on disk.
-    void change(Queue::Task work)
+    /// Or will be, by a change that waits.
+    [[nodiscard]] bool mayBeOnDisk(const std::string& key) const
     {
-        ++waitingChanges;
-        configuration.queue->async([self = shared_from_this(), work = std::move(work)]() mutable {
+        return !onDisk || onDisk->contains(hash(key)) || changing.contains(hash(key));
+    }
+    /// Queues a change of what is on disk under a key of that hash, which holds so many bytes until it is done.
+    void change(std::size_t keyHash, std::size_t bytes, Queue::Task work)
+    {
+        changing.insert(keyHash);
+        waitingBytes += bytes;
+        configuration.queue->async([self = shared_from_this(), keyHash, bytes, work = std::move(work)]() mutable {
             work();
             std::lock_guard lock(self->mutex);
-            --self->waitingChanges;
+            self->changing.erase(self->changing.find(keyHash));
+            self->waitingBytes -= bytes;
         });
+    }
+    void removeBehind(std::string key)
+    {
+        if (!mayBeOnDisk(key)) return;
+        const std::size_t keyHash = hash(key);
+        change(keyHash, 0, [self = shared_from_this(), key = std::move(key)] { self->removeFromDisk(key); });
+    }
+    void forgetOnDisk(const std::string& key)
+    {
+        if (onDisk) onDisk->erase(hash(key));
     }
 
     // Any thread.
@@ -179,7 +192,7 @@ private:
         std::lock_guard lock(mutex);
         if (!*found)
             forgetOnDisk(key);
-        else if (!(*found)->mapped && waitingChanges == 0)
+        else if (!(*found)->mapped && !changing.contains(hash(key)))
             memory.put(key, *found);
         return *found;
     }
@@ -232,13 +245,6 @@ private:
         for (const std::string& key : used) store->noteUse(key);
     }
 
-    /// Under the mutex. A change that waits, the one that runs aside, may be about this key: it stays then, which costs
-    /// a look into the index.
-    void forgetOnDisk(const std::string& key)
-    {
-        if (onDisk && waitingChanges <= 1) onDisk->erase(hash(key));
-    }
-
     [[nodiscard]] bool openStore()
     {
         if (store) return true;
@@ -260,7 +266,6 @@ private:
         store = std::move(*opened);
         closed = false;
         std::lock_guard lock(mutex);
-        if (onDisk) hashes.merge(*onDisk); // those that wait to be written
         onDisk = std::move(hashes);
         return true;
     }
@@ -269,7 +274,7 @@ private:
     {
         store.reset();
         std::lock_guard lock(mutex);
-        if (!onDisk || waitingChanges <= 1) onDisk.emplace();
+        onDisk.emplace();
     }
 
     void failed(const Error& error)
@@ -295,11 +300,12 @@ private:
     MemoryCache memory;                                    // under the mutex
     std::optional<std::unordered_set<std::size_t>> onDisk; // under the mutex: hashes of the keys, or more; none before
                                                            // it was first opened
-    std::size_t waitingChanges = 0;        // under the mutex; with the one that runs
-    std::unique_ptr<HttpCacheStore> store; // queue
-    bool closed = false;                   // queue: it couldn't be opened
-    std::uint64_t nextAttempt = 0;         // queue: host ticks
-    bool failing = false;                  // queue
+    std::unordered_multiset<std::size_t> changing; // under the mutex: of the changes that wait, and the one that runs
+    std::size_t waitingBytes = 0;                  // under the mutex: what those hold
+    std::unique_ptr<HttpCacheStore> store;         // queue
+    bool closed = false;                           // queue: it couldn't be opened
+    std::uint64_t nextAttempt = 0;                 // queue: host ticks
+    bool failing = false;                          // queue
 };
 
 HttpCache::HttpCache(std::shared_ptr<Impl> impl) : _impl(std::move(impl)) {}

@@ -30,6 +30,11 @@ Url url(int number)
 
 /// A cache in a directory, whose queue runs when the test says so, or when it is waited for.
 struct HttpCacheTest : testing::Test {
+    ~HttpCacheTest() override
+    {
+        cache.reset();
+        executor.drain(); // what waits keeps the cache
+    }
     void open(std::size_t memory = 0, std::uint64_t disk = 1u << 20)
     {
         cache.reset();
@@ -166,8 +171,8 @@ TEST_F(HttpCacheTest, UsesInMemoryCountOnDisk)
     for (int i = 0; i < 40; ++i) {
         store(i, kLarge);
         EXPECT_EQ(find(0), kLarge);
+        executor.drain();
     }
-    executor.drain();
     open(0, 250'000);
     EXPECT_EQ(find(0), kLarge);
     EXPECT_EQ(find(20), "(none)");
@@ -200,6 +205,45 @@ TEST_F(HttpCacheTest, LookUpsQueueBehindWhatIsBeingWrittenAndAskTheDiskOnlyWhere
     store(1, "memory");
     lookUp(1);
     EXPECT_EQ(seen, "--onetwo-mem") << "at once";
+}
+
+TEST_F(HttpCacheTest, WhatWasStoredIsThereWhereverItWaits)
+{
+    open();
+    store(1, "old");
+    open();
+    std::string seen;
+    const auto lookUp = [&](int number, auto next) {
+        cache->lookUp(url(number), [&seen, next](auto found) {
+            seen += found ? found->body.view().substr(0, 3) : "-";
+            next();
+        });
+    };
+    // The second look-up is made by the first, while all that was stored still waits behind it.
+    lookUp(3, [&] {
+        for (const int number : {1, 2, 3, 4}) lookUp(number, [] {});
+    });
+    store(1, "new");
+    store(2, "two");
+    cache->remove(url(2));
+    store(2, "too");
+    store(3, "thr");
+    executor.drain();
+    EXPECT_EQ(seen, "--newtoothr");
+}
+
+TEST_F(HttpCacheTest, ASlowDiskDoesNotFillTheMemory)
+{
+    open(0, 1u << 30);
+    store(0, "before");
+    EXPECT_EQ(find(0), "before");
+    const std::string megabytes(16u << 20, 'x');
+    for (const int number : {1, 2, 3, 4, 0}) store(number, megabytes);
+    for (const int number : {1, 2, 3}) EXPECT_EQ(find(number).size(), megabytes.size());
+    EXPECT_EQ(find(4), "(none)");
+    EXPECT_EQ(find(0), "(none)") << "the one before is outdated";
+    store(4, megabytes);
+    EXPECT_EQ(find(4).size(), megabytes.size()) << "the disk has caught up";
 }
 
 TEST_F(HttpCacheTest, NothingOutdatedComesFromTheDiskIntoMemory)
@@ -358,6 +402,50 @@ TEST_F(HttpCacheTest, AFullDiskKeepsWhatIsThere)
     store(3, kLarge);
     EXPECT_EQ(find(3), kLarge);
     EXPECT_TRUE(std::ranges::any_of(lines, [](const auto& line) { return line.contains("can't be used"); }));
+}
+
+/// Makes root somebody to whom directories may be read-only.
+struct AsNobody {
+    explicit AsNobody(const fs::path& directory)
+    {
+        if (geteuid() != 0) return;
+        constexpr uid_t kNobody = 65534;
+        if (chown(directory.c_str(), kNobody, static_cast<gid_t>(-1)) != 0 || seteuid(kNobody) != 0) std::abort();
+    }
+    ~AsNobody()
+    {
+        if (seteuid(getuid()) != 0) std::abort();
+    }
+};
+
+TEST_F(HttpCacheTest, AReadOnlyDirectoryIsReadAndNothingElse)
+{
+    const AsNobody nobody(directory.path);
+    open();
+    store(1, kLarge);
+    store(2, kLarge);
+    executor.drain();
+    fs::permissions(directory / "http", fs::perms::owner_read | fs::perms::owner_exec);
+    EXPECT_EQ(find(1), kLarge);
+    store(2, std::string(30'000, 'n'));
+    store(3, kLarge);
+    EXPECT_NE(find(2), kLarge) << "an answer that was replaced is no longer true";
+    EXPECT_EQ(find(3), "(none)");
+    EXPECT_EQ(find(1), kLarge);
+    EXPECT_EQ(std::ranges::count_if(lines, [](const auto& line) { return line.contains("can't be used"); }), 1);
+
+    open();
+    for (const int number : {1, 3}) {
+        const std::string found = find(number);
+        EXPECT_TRUE(found == "(none)" || (number == 1 && found == kLarge)) << number;
+    }
+    store(3, kSmall);
+    (void)find(3);
+    fs::permissions(directory / "http", fs::perms::owner_all);
+    clock.advance(61s, [] {});
+    store(3, kLarge);
+    EXPECT_EQ(find(3), kLarge);
+    cache.reset();
 }
 
 TEST_F(HttpCacheTest, AnIndexOfOtherTablesIsBegunAnew)
