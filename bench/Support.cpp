@@ -194,12 +194,24 @@ void Echo::roundTrip()
             "a round trip");
 }
 
-int listenAt(const std::string& path)
+namespace {
+
+/// A Unix socket, and what `use` (bind or connect) makes of it at `path`.
+int unixSocket(const std::string& path, int (*use)(int, const sockaddr*, socklen_t))
 {
     const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
     sockaddr_un address{AF_UNIX, {}};
     std::strncpy(address.sun_path, path.c_str(), sizeof(address.sun_path) - 1);
-    require(bind(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)) == 0 && listen(fd, 1024) == 0, path);
+    require(use(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)) == 0, path);
+    return fd;
+}
+
+} // namespace
+
+int listenAt(const std::string& path)
+{
+    const int fd = unixSocket(path, bind);
+    require(listen(fd, 1024) == 0, path);
     return fd;
 }
 
@@ -235,9 +247,45 @@ Daemon::Daemon(const std::string& bagURL, const std::vector<std::string>& enviro
     close(socket);
 }
 
-std::unique_ptr<TAVClient> Daemon::client(bool withBag, const std::string& agent) const
+Daemon::Sizes Daemon::sizesOf(const std::function<void(TAVClient&)>& call) const
 {
-    auto client = TAVClient::connect(address());
+    const std::string path = _home / "counted";
+    const int listener = listenAt(path);
+    std::atomic<std::size_t> counts[2] = {0, 0};
+    std::thread relay([&, daemon = unixSocket(_home / "run/socket", connect)] {
+        pollfd ends[] = {{accept4(listener, nullptr, nullptr, SOCK_CLOEXEC), POLLIN, 0}, {daemon, POLLIN, 0}};
+        std::vector<char> bytes(1 << 16);
+        for (bool open = true; open;) {
+            poll(ends, 2, -1);
+            for (int from = 0; from < 2; ++from) {
+                if (!ends[from].revents) continue;
+                const ssize_t count = read(ends[from].fd, bytes.data(), bytes.size());
+                if (count <= 0) {
+                    open = false;
+                    break;
+                }
+                counts[from] += static_cast<std::size_t>(count);
+                require(write(ends[1 - from].fd, bytes.data(), static_cast<std::size_t>(count)) == count, "a relay");
+            }
+        }
+        for (const pollfd& end : ends) close(end.fd);
+    });
+    Sizes sizes{};
+    {
+        const auto client = clientAt("unix:path=" + path, true, "bench/1");
+        call(*client);
+        const std::size_t before[] = {counts[0], counts[1]};
+        call(*client);
+        sizes = {counts[0] - before[0], counts[1] - before[1]};
+    }
+    relay.join();
+    close(listener);
+    return sizes;
+}
+
+std::unique_ptr<TAVClient> Daemon::clientAt(const std::string& address, bool withBag, const std::string& agent)
+{
+    auto client = TAVClient::connect(address);
     require(client.has_value(), "the daemon doesn't answer");
     bool bagArrived = false;
     (*client)->onBagDidLoad([&](const TAVBagAnswer& answer) { bagArrived = bagArrived || answer.bag; });
@@ -315,7 +363,8 @@ void Service::serve(int connection)
         if (!bag && _delay > 0) poll(&fds[1], 1, static_cast<int>(_delay * 1000));
         std::unique_lock lock(_answerMutex);
         const std::string body =
-            bag ? platform::toJson(platform::Value::dictionaryOf({{"version", "1"}, {"searchURL", url("/search")}})) : _answer;
+            bag ? platform::toJson(platform::Value::dictionaryOf({{"version", "1"}, {"searchURL", url("/search")}}))
+                : _answer;
         lock.unlock();
         const std::string answer = fmt::format(
             "HTTP/1.1 200 OK\r\nContent-Type: application/json\r\nContent-Length: {}\r\n\r\n{}", body.size(), body);

@@ -87,22 +87,6 @@ private:
     int _output = -1;
 };
 
-/// A process at the other end of a bare socket, that answers `call` bytes with `reply` bytes.
-class Echo {
-public:
-    Echo(std::size_t call, std::size_t reply);
-    ~Echo();
-    Echo(const Echo&) = delete;
-    Echo& operator=(const Echo&) = delete;
-    void roundTrip();
-
-private:
-    std::size_t _call, _reply;
-    std::string _message;
-    int _socket = -1;
-    pid_t _pid = -1;
-};
-
 /// A Unix socket in the listening state.
 [[nodiscard]] int listenAt(const std::string& path);
 
@@ -115,11 +99,39 @@ public:
     [[nodiscard]] std::string address() const { return "unix:path=" + (_home / "run/socket").string(); }
     [[nodiscard]] pid_t pid() const { return _process->pid(); }
     /// A client that has configured itself; waits until it has the bag, where `withBag`.
-    [[nodiscard]] std::unique_ptr<TAVClient> client(bool withBag = true, const std::string& agent = "bench/1") const;
+    [[nodiscard]] std::unique_ptr<TAVClient> client(bool withBag = true, const std::string& agent = "bench/1") const
+    {
+        return clientAt(address(), withBag, agent);
+    }
+    /// The bytes that a call takes on its way to the daemon and back: they are counted between a client and the daemon.
+    /// `call` is made twice, and the second time counts.
+    struct Sizes {
+        std::size_t call, reply;
+    };
+    [[nodiscard]] Sizes sizesOf(const std::function<void(TAVClient&)>& call) const;
 
 private:
+    [[nodiscard]] static std::unique_ptr<TAVClient> clientAt(const std::string& address, bool withBag,
+                                                             const std::string& agent);
     Directory _home; // outlives the process
     std::unique_ptr<Process> _process;
+};
+
+/// A process at the other end of a bare socket, that answers `call` bytes with `reply` bytes.
+class Echo {
+public:
+    Echo(std::size_t call, std::size_t reply);
+    explicit Echo(Daemon::Sizes sizes) : Echo(sizes.call, sizes.reply) {}
+    ~Echo();
+    Echo(const Echo&) = delete;
+    Echo& operator=(const Echo&) = delete;
+    void roundTrip();
+
+private:
+    std::size_t _call, _reply;
+    std::string _message;
+    int _socket = -1;
+    pid_t _pid = -1;
 };
 
 /// A search service over HTTP on loopback: a bag at /bag, and the same JSON answer of `answerSize` bytes for everything

@@ -28,10 +28,6 @@ namespace {
 constexpr double kReportedOnly = std::numeric_limits<double>::infinity();
 
 constexpr std::size_t kAnswerSize = 20'000;
-/// A search is some 360 bytes on the wire, a reply has some 200 beside the answer.
-constexpr std::size_t kCallSize = 360;
-constexpr std::size_t kReplySize = kAnswerSize + 200;
-
 constexpr double kScale = 2;
 
 TAVAnswer search(TAVClient& client, std::int64_t queryId, const std::string& text, bool verbose = false)
@@ -83,19 +79,18 @@ std::vector<Row> hit()
     Service service(kAnswerSize, 0, "weather in the mountains");
     const Daemon daemon(service.url("/bag"));
     const auto client = daemon.client();
-    Echo echo(kCallSize, kReplySize);
-
     std::int64_t queryId = 0;
     (void)search(*client, ++queryId, "wea");
     service.setDelay(-1); // from here on, a search that isn't answered from memory isn't answered
+    const auto searchFurther = [&queryId](TAVClient& asking) {
+        if (search(asking, ++queryId, "weather").reply->rawResponse->size() < kAnswerSize) std::abort();
+    };
+    Echo echo(daemon.sizesOf(searchFurther));
+
     std::vector<double> ours, beside;
     for (int round = 0; round < kRounds; ++round) {
         std::fprintf(stderr, "\ranswers from memory: round %d of %d ", round + 1, kRounds);
-        for (int i = 0; i < kCalls; ++i) {
-            ours.push_back(timeOf([&] {
-                if (search(*client, ++queryId, "weather").reply->rawResponse->size() < kAnswerSize) std::abort();
-            }));
-        }
+        for (int i = 0; i < kCalls; ++i) ours.push_back(timeOf([&] { searchFurther(*client); }));
         for (int i = 0; i < kCalls; ++i) beside.push_back(timeOf([&] { echo.roundTrip(); }));
     }
     std::fputc('\n', stderr);

@@ -86,9 +86,7 @@ Result<PrivacyLedger> PrivacyLedger::parse(std::string_view text)
 
 std::string hexText(std::span<const std::uint8_t> bytes)
 {
-    std::string text;
-    for (const std::uint8_t byte : bytes) text += fmt::format("{:02x}", byte);
-    return text;
+    return fmt::format("{:02x}", fmt::join(bytes, ""));
 }
 
 bool readHex(std::string_view text, std::span<std::uint8_t> bytes)

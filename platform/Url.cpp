@@ -6,6 +6,8 @@
 
 #include <curl/curl.h>
 
+#include "platform/UrlScheme.h"
+
 namespace platform {
 
 namespace {
@@ -137,11 +139,8 @@ std::optional<Url> Url::parse(std::string_view text)
     if (encoded.contains('%')) encoded = withWholeEscapes(encoded);
     const std::size_t colon = encoded.find(':');
     const std::string_view scheme = std::string_view(encoded).substr(0, colon);
-    const bool hasScheme = colon != std::string::npos && colon > 0 && isUnreserved(scheme[0]) && scheme[0] > '9' &&
-                           std::ranges::all_of(scheme, [](unsigned char c) {
-                               return (isUnreserved(c) && c != '_' && c != '~') || c == '+';
-                           });
-    if (!hasScheme || encoded.size() > kMaximumLength || !parsed(encoded)) return std::nullopt;
+    if (colon == std::string::npos || !isUrlScheme(scheme) || encoded.size() > kMaximumLength || !parsed(encoded))
+        return std::nullopt;
     return Url(std::move(encoded));
 }
 

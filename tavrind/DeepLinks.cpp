@@ -5,6 +5,7 @@
 
 #include "platform/Text.h"
 #include "platform/Url.h"
+#include "platform/UrlScheme.h"
 
 namespace tavrin {
 
@@ -21,14 +22,9 @@ bool isDigit(char c)
     return c >= '0' && c <= '9';
 }
 
-bool isLetter(char c)
-{
-    return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z');
-}
-
 bool isUnreserved(char c)
 {
-    return isLetter(c) || isDigit(c) || kUnreserved.contains(c);
+    return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || isDigit(c) || kUnreserved.contains(c);
 }
 
 /// Percent-encodes all but `marks` and unreserved characters.
@@ -73,13 +69,6 @@ std::optional<std::string> hostOf(std::string_view authority)
     return address ? std::optional(platform::lowerCased(host)) : std::nullopt;
 }
 
-bool isScheme(std::string_view text)
-{
-    return !text.empty() && isLetter(text.front()) && std::ranges::all_of(text, [](char c) {
-        return isLetter(c) || isDigit(c) || c == '+' || c == '-' || c == '.';
-    });
-}
-
 /// The text of a link as it is recorded; empty where it is no link.
 std::string recordedLink(std::string_view link)
 {
@@ -95,8 +84,8 @@ std::optional<DeepLinkComponents> deepLinkComponents(std::string_view link)
 {
     const auto isControl = [](char c) { return static_cast<unsigned char>(c) < 0x20 || c == 0x7f; };
     const auto colon = link.find(':');
-    if (link.size() > kLongestLink || colon == std::string_view::npos || !isScheme(link.substr(0, colon)) ||
-        std::ranges::any_of(link, isControl))
+    if (link.size() > kLongestLink || colon == std::string_view::npos ||
+        !platform::isUrlScheme(link.substr(0, colon)) || std::ranges::any_of(link, isControl))
         return std::nullopt;
     std::string_view rest = link.substr(colon + 1);
     rest = rest.substr(0, rest.find_first_of("?#"));

@@ -1,6 +1,5 @@
 #include "tavrind/FeedbackProcessing.h"
 
-#include "CoreTavrin/TAVFeedback.h"
 #include "searchrecords/ZRResultFeedback.h"
 #include "tavrind/FeedbackTypes.h"
 #include "tavrind/SessionProcessingHelper.h"
@@ -82,8 +81,7 @@ void process(ZRFeedback& record, SessionProcessingHelper& helper)
     switch (eventType(record)) {
     case EventType::VisibleResults: // whole results come with the ranking
         return processor.referToAll(as<ZRVisibleResultsFeedback>(record).results);
-    case EventType::RankSections:
-        if (record.className() == TAVRankerFeedback::kClass) return; // its event has no sections
+    case EventType::RankSections: // a ranker's record, too, though its event has no sections
         return processor.showAll(as<ZRRankingFeedback>(record).sections);
     case EventType::ResultsReceivedAfterTimeout:
         return processor.showAll(as<ZRResultsReceivedAfterTimeoutFeedback>(record).results);

@@ -22,7 +22,7 @@ const platform::Log& log()
 void run(const std::shared_ptr<const TavrinDPPeriodicTask>& task, const std::shared_ptr<platform::Activity>& activity,
          platform::Transactions& transactions)
 {
-    const bool extended = activity->setState(ActivityState::Continue);
+    const bool extended = TavrinXPCActivity::setState(ActivityState::Continue, *activity);
     log().log("Running activity {}, extended={:d}", task->name(), extended);
     task->queue()->async([task, activity, &transactions, extended] {
         {
@@ -30,7 +30,7 @@ void run(const std::shared_ptr<const TavrinDPPeriodicTask>& task, const std::sha
             task->handler()();
         }
         if (!extended) return;
-        activity->setState(ActivityState::Done);
+        (void)TavrinXPCActivity::setState(ActivityState::Done, *activity);
         log().log("Done running activity {}, extended={:d}", task->name(), extended);
     });
 }
@@ -50,10 +50,11 @@ void TavrinDPPeriodicTaskManager::registerTask(std::shared_ptr<const TavrinDPPer
                                             const std::shared_ptr<platform::Activity>& activity) {
                                             const auto self = weak.lock();
                                             if (!self) return;
-                                            if (activity->state() == ActivityState::CheckIn) {
+                                            const auto state = TavrinXPCActivity::getStateForActivity(*activity);
+                                            if (state == ActivityState::CheckIn) {
                                                 log().log("Checking-in activity {}", self->name());
                                                 activity->setCriteria(self->executionCriteria());
-                                            } else if (activity->state() == ActivityState::Run) {
+                                            } else if (state == ActivityState::Run) {
                                                 run(self, activity, transactions);
                                             }
                                         });

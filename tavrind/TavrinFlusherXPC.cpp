@@ -3,6 +3,7 @@
 #include <utility>
 
 #include "platform/Device.h"
+#include "platform/Queue.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/BackgroundActivitiesManager.h"
 #include "tavrind/ClientConnection.h"
@@ -57,7 +58,8 @@ std::shared_ptr<TavrinFlusherXPC> TavrinFlusherXPC::make(Assembly& assembly, Get
 
 TavrinFlusherXPC::TavrinFlusherXPC(Assembly& assembly, GetClientConnections getClientConnections)
     : _assembly(assembly), _getClientConnections(std::move(getClientConnections)),
-      _ipcListener(assembly.device.ipc.anonymous(flusherInterface(), "com.quorvane.tavrind.flusherXPC"))
+      _ipcListener(assembly.device.ipc.anonymous(flusherInterface(), "com.quorvane.tavrind.flusherXPC")),
+      _queue(assembly.device.serialQueue("com.quorvane.tavrind.flusherXPCQueue"))
 {}
 
 TavrinFlusherXPC::~TavrinFlusherXPC()
@@ -81,56 +83,47 @@ void TavrinFlusherXPC::_accept(const std::shared_ptr<platform::ipc::Connection>&
         log().log("listener invalidated");
         if (const auto self = weak.lock()) self->_removeDelegate(tool);
     });
-    {
-        const std::lock_guard lock(_mutex);
-        _remoteObject = tool;
-    }
+    _queue->async([self = shared_from_this(), tool] { self->_remoteObject = tool; });
     connection->resume();
 }
 
 void TavrinFlusherXPC::_removeDelegate(const Tool& tool)
 {
-    const std::lock_guard lock(_mutex);
-    if (_receivingStreamListener == tool) {
-        _receivingStreamListener = nullptr;
-        log().log("Removed receiving stream listener");
-    }
-    if (_sendingStreamListener == tool) {
-        _sendingStreamListener = nullptr;
-        log().log("Removed sending stream listener");
-    }
-    if (_remoteObject == tool) {
-        _remoteObject = nullptr;
-        log().log("Removed remote listener");
-    }
+    const auto remove = [&tool](Tool& role, const char* what) {
+        if (role != tool) return;
+        role = nullptr;
+        log().log("Removed {} listener", what);
+    };
+    _queue->sync([&] {
+        remove(_receivingStreamListener, "receiving stream");
+        remove(_sendingStreamListener, "sending stream");
+        remove(_remoteObject, "remote");
+    });
 }
 
 void TavrinFlusherXPC::initiateConnectionWithIntent(std::uint64_t intent, std::shared_ptr<TAVFlusherListener> tool)
 {
     constexpr std::uint64_t kLastIntent = 3;
     if (intent > kLastIntent) return log().log("Unsupported command yet: {}", intent);
-    std::unique_lock lock(_mutex);
-    _remoteObject = tool;
-    switch (intent) {
-    case 0:
-        _sendingStreamListener = std::move(tool);
-        return log().log("new listener for flusher client sessions, delegate: {}",
-                         static_cast<const void*>(_sendingStreamListener.get()));
-    case 1:
-        _receivingStreamListener = std::move(tool);
-        return log().log("new listener for client feedbacks, delegate: {}", static_cast<const void*>(_receivingStreamListener.get()));
-    case 2:
-        lock.unlock();
-        log().log("flushing stopped; dump command will start flushing again");
-        _assembly.backgroundFlusher->setStopFlushing(true);
-        return tool->workDone();
-    case 3:
-        if (!_sendingStreamListener) {
+    _queue->sync([&] {
+        _remoteObject = tool;
+        if (intent == 0) _sendingStreamListener = tool;
+        if (intent == 1) _receivingStreamListener = tool;
+        if (intent == 3 && !_sendingStreamListener) {
             log().log("no listener for sending stream setting this client as remote");
             _sendingStreamListener = tool;
         }
-        lock.unlock();
-        return _dump(tool);
+    });
+    switch (intent) {
+    case 0:
+        return log().log("new listener for flusher client sessions, delegate: {}",
+                         static_cast<const void*>(tool.get()));
+    case 1: return log().log("new listener for client feedbacks, delegate: {}", static_cast<const void*>(tool.get()));
+    case 2:
+        log().log("flushing stopped; dump command will start flushing again");
+        _assembly.backgroundFlusher->setStopFlushing(true);
+        return tool->workDone();
+    default: return _dump(tool);
     }
 }
 
@@ -151,8 +144,7 @@ void TavrinFlusherXPC::_dump(const Tool& tool)
 
 TavrinFlusherXPC::Tool TavrinFlusherXPC::_holderOf(Tool TavrinFlusherXPC::*role) const
 {
-    const std::lock_guard lock(_mutex);
-    return this->*role;
+    return _queue->sync([&] { return this->*role; });
 }
 
 void TavrinFlusherXPC::sendDataToSendingStreamListener(const platform::Bytes& body)

@@ -2,11 +2,14 @@
 
 #include <functional>
 #include <memory>
-#include <mutex>
 #include <string>
 #include <vector>
 
 #include "CoreTavrin/TAVProtocols.h"
+
+namespace platform {
+class Queue;
+}
 
 namespace tavrin {
 
@@ -47,8 +50,8 @@ private:
     Assembly& _assembly;
     GetClientConnections _getClientConnections;
     std::unique_ptr<platform::ipc::Listener> _ipcListener;
-    mutable std::mutex _mutex; // guards all below
-    Tool _remoteObject;        ///< sent the last command
+    const std::shared_ptr<platform::Queue> _queue; // guards all below
+    Tool _remoteObject;                            ///< connected last, or sent the last command
     Tool _sendingStreamListener;
     Tool _receivingStreamListener;
 };

@@ -19,7 +19,6 @@ namespace {
 using namespace std::chrono_literals;
 using platform::ActivityState;
 using platform::AppActivity;
-using platform::LogLevel;
 using platform::test::LogCapture;
 
 TEST(DeepLink, NormalizationLeavesOnlyWhereALinkLeads)
@@ -194,7 +193,6 @@ TEST_F(PeriodicTaskTest, RunsInATransactionWheneverItsActivityDoes)
     EXPECT_EQ(refused->state(), ActivityState::Run);
     EXPECT_EQ(log.count("Running activity task, extended=0"), 1);
     EXPECT_EQ(log.count("Done running activity task"), 1) << "that of the first run";
-    EXPECT_FALSE(log.has(LogLevel::Fault, "Tavrin_Flusher", "invalid"));
 }
 
 TEST_F(PeriodicTaskTest, IsForgottenWhenUnregistered)

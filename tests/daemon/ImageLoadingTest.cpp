@@ -1,3 +1,5 @@
+#include <algorithm>
+
 #include <fmt/format.h>
 
 #include "CoreTavrin/ResponseImages.h"
@@ -179,7 +181,8 @@ struct ImageLoadingTest : DaemonTest {
     /// A search that is answered with `images` under the role "posters".
     void answerSearch(const Value& images)
     {
-        (void)search(*connection, ++queryId, fmt::format("query {}", queryId));
+        ++queryId;
+        (void)search(*connection, queryId, fmt::format("query {}", queryId));
         session->records.clear();
         respond(platform::toJson(
             Value::Array{Dictionary{{"status", "OK"}, {"results", Value::Array{Dictionary{{"posters", images}}}}}}));

@@ -9,6 +9,8 @@
 #include "tavrind/TavrinFeedbackFlusher.h"
 #include "tests/support/Examples.h"
 #include "tests/support/FeedbackFixture.h"
+#include "tests/support/FullDisk.h"
+#include "tests/support/TemporaryDirectory.h"
 
 namespace tavrin::test {
 namespace {
@@ -102,8 +104,8 @@ TEST_F(SessionFileTest, CutAnywhereItGivesEveryWholeEventBeforeTheCut)
     ASSERT_EQ(ends.size(), 6u);
     for (std::size_t cut = 0; cut <= whole.size(); ++cut) {
         const auto session = adopted(whole.substr(0, cut))->read();
-        const auto recordsLeft = static_cast<std::size_t>(
-            std::ranges::count_if(ends, [cut](std::size_t end) { return end <= cut; }));
+        const auto recordsLeft =
+            static_cast<std::size_t>(std::ranges::count_if(ends, [cut](std::size_t end) { return end <= cut; }));
         ASSERT_EQ(session != nullptr, recordsLeft >= 2) << cut;
         if (!session) continue;
         const std::vector expected(inputs.begin(), inputs.begin() + static_cast<long>(recordsLeft) - 2);
@@ -195,6 +197,46 @@ TEST_F(SessionFileTest, ARecordThatFailedIsNotThere)
     storage()->closeSessionWithFileContainer(container);
     device.drain();
     EXPECT_EQ(inputsIn(*container->read()), (std::vector<std::string>{"1", "3", "5"}));
+}
+
+TEST_F(SessionFileTest, AWriteCutShortAtAnyByteLosesOneRecord)
+{
+    start();
+    LogCapture log; // standard error may be a file, which must not grow either
+    const platform::test::TemporaryDirectory directory;
+    const auto files = platform::makeSystemFiles();
+    const FileContainerStore& usual = storage()->store();
+    const FileContainerStore store{*files,      usual.transactions, usual.diagnosticData, usual.books,
+                                   usual.queue, usual.version,      usual.maxFileSize};
+    const auto share = std::shared_ptr<const FileContainerStore>(std::shared_ptr<void>(), &store);
+    const std::vector<std::string> inputs{"a", std::string(30, 'b'), "c"};
+    const auto ends = recordEnds(contents(closedFile(inputs)->fileUrl().filename()));
+    ASSERT_EQ(ends.size(), 5u);
+    const std::size_t begin = ends[1], small = ends[2] - begin;
+    for (std::size_t room = begin; room <= ends.back(); ++room) {
+        const auto path = directory / ("session." + std::to_string(room));
+        const auto container =
+            std::make_shared<FileContainer>(share, path, std::move(*files->createForAppending(path)));
+        const auto write = [&](const std::string& input) {
+            assembly().feedbackBooks.record(FeedbackFate::Open);
+            container->writeFeedback(feedback(input), {});
+            device.drain();
+        };
+        container->writeSessionHeader(header());
+        device.drain();
+        platform::test::onFullDisk(room, [&] { std::ranges::for_each(inputs, write); });
+        write("later");
+        container->close();
+        device.drain();
+
+        std::vector<std::string> expected; // the last one still fits where the long one doesn't
+        if (room >= ends[2]) expected.push_back(inputs[0]);
+        if (room >= ends[3]) expected.push_back(inputs[1]);
+        if (room >= begin + (room >= ends[3] ? ends[3] - begin : small) + small) expected.push_back(inputs[2]);
+        expected.emplace_back("later");
+        ASSERT_EQ(inputsIn(*container->read()), expected) << room;
+    }
+    expectBooksClose();
 }
 
 TEST_F(SessionFileTest, WhatIsNoSessionFileIsNotRead)
@@ -352,11 +394,13 @@ TEST_F(SessionFileTest, WhatStandsInTheWayIsLeftAlone)
 {
     start();
     device.files.files.clear();
+    device.files.directories.insert(std::string(kDirectory) + "session.5");
     const auto scanned = std::make_shared<TavrinPersistentStorage>(assembly());
-    device.files.directories.insert(std::string(kDirectory) + "session.1"); // since the scan
+    EXPECT_TRUE(scanned->getAvailableSessionHandles().empty());
+    device.files.directories.insert(std::string(kDirectory) + "session.6"); // since the scan
     const auto container = scanned->createFileContainerForWriting();
     ASSERT_TRUE(container);
-    EXPECT_EQ(container->fileUrl().filename(), "session.2");
+    EXPECT_EQ(container->fileUrl().filename(), "session.7");
 }
 
 TEST_F(SessionFileTest, LimitsThatAreNoneAreTheUsualOnes)

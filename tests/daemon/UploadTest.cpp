@@ -299,6 +299,39 @@ TEST_F(UploadTest, FaultsOfTheDiskLoseOneSessionAndNothingElse)
     EXPECT_EQ(temporaryFiles(), 1u) << "of the body that could not be written";
 }
 
+TEST_F(UploadTest, WhicheverWriteFailsOnlyWhatItHeldIsLost)
+{
+    for (const int error : {ENOSPC, EIO}) {
+        std::vector<std::size_t> lost; // of four events, with each write in turn
+        for (bool failed = true; failed;) {
+            begin();
+            failed = false;
+            std::size_t writes = 0;
+            device.files.fault = [&](std::string_view operation, const std::filesystem::path&) {
+                const bool isWrite = operation == "mkdir" || operation == "create" || operation == "append";
+                if (!isWrite || writes++ != lost.size()) return 0;
+                failed = true;
+                return error;
+            };
+            for (const char* name : {"ZRSearchViewAppearFeedback", "ZRClearInputFeedback", "ZRDidGoToSiteFeedback"})
+                report(name);
+            flushSession();
+            upload();
+            device.files.fault = {};
+            std::size_t arrived = 0;
+            for (const auto& task : uploads()) arrived += typesIn(decoded(*task)).size();
+            if (failed)
+                lost.push_back(4 - arrived);
+            else
+                EXPECT_EQ(arrived, 4u);
+            expectBooksClose();
+            EXPECT_EQ(typesIn(decoded(*uploadOne())), (Types{"search_view_appear", "session_end"})) << lost.size();
+        }
+        // The directory, the file, its version and header; the events; the upload's body.
+        EXPECT_EQ(lost, (std::vector<std::size_t>{4, 4, 4, 4, 1, 1, 1, 1, 4, 4})) << error;
+    }
+}
+
 TEST_F(UploadTest, AThousandClientsComeAndGo)
 {
     for (const bool shared : {true, false}) {
@@ -411,8 +444,9 @@ TEST_F(BridgeTest, EventsAreShownLive)
     ASSERT_EQ(pushes.size(), 1u);
     EXPECT_EQ(pushes[0].signal, "ReceivedFeedbackDescription");
     const auto event = platform::parseJson(*pushes[0].message.args[0].asString());
-    EXPECT_EQ(*event, (Value(Dictionary{
-                          {"input", "example.org"}, {"query_id", 4}, {"type", "did_go_to_site"}, {"timestamp", 7654}})));
+    EXPECT_EQ(*event,
+              (Value(Dictionary{
+                  {"input", "example.org"}, {"query_id", 4}, {"type", "did_go_to_site"}, {"timestamp", 7654}})));
     intent(*watcher, 7);
     EXPECT_TRUE(watcher->takePushes().empty()) << "no such command";
     watcher->end();

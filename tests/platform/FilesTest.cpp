@@ -1,21 +1,21 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
-#include <csignal>
 #include <fcntl.h>
 #include <map>
 #include <optional>
-#include <sys/resource.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include "platform/Files.h"
+#include "tests/support/FullDisk.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace platform {
 namespace {
 
 namespace fs = std::filesystem;
+using test::onFullDisk;
 using test::writeFile;
 
 struct FilesTest : testing::Test {
@@ -25,20 +25,6 @@ struct FilesTest : testing::Test {
     {
         struct stat status {};
         return stat(path.c_str(), &status) == 0 ? status.st_mode & 07777 : 0;
-    }
-
-    /// Calls `write` where no file may have more than `size` bytes: a write beyond is cut short, as on a full disk.
-    template <class Write> static auto onFullDisk(rlim_t size, Write write)
-    {
-        rlimit before{};
-        getrlimit(RLIMIT_FSIZE, &before);
-        const auto handler = signal(SIGXFSZ, SIG_IGN);
-        const rlimit small{.rlim_cur = size, .rlim_max = before.rlim_max};
-        setrlimit(RLIMIT_FSIZE, &small);
-        auto result = write();
-        setrlimit(RLIMIT_FSIZE, &before);
-        signal(SIGXFSZ, handler);
-        return result;
     }
 
     test::TemporaryDirectory directory;

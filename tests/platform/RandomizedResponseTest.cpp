@@ -127,6 +127,37 @@ TEST(RandomizedResponse, ManyReportsOfATextTellNoMoreThanItsPermanentResponse)
     EXPECT_NE(permanentFlips(secret, "ab", "c"), permanentFlips(secret, "a", "bc"));
 }
 
+/// The chance that `set` of `reports` reports have a bit which the permanent response left set with the chance `rate`.
+double chanceOf(int set, int reports, double rate)
+{
+    const auto given = [&](double bitRate) { return std::pow(bitRate, set) * std::pow(1 - bitRate, reports - set); };
+    return rate * given(1 - kPrivacyFlip) + (1 - rate) * given(kPrivacyFlip);
+}
+
+TEST(RandomizedResponse, AnyNumberOfReportsOfATextLosesNoMoreThanDerived)
+{
+    const auto lost = [](int n) { // of two bits
+        double most = 0;
+        for (int set = 0; set <= n; ++set)
+            most =
+                std::max(most, std::abs(std::log(chanceOf(set, n, 1 - kPrivacyFlip) / chanceOf(set, n, kPrivacyFlip))));
+        return 2 * most;
+    };
+    for (int n = 1; n <= 40; ++n)
+        EXPECT_LE(lost(n), std::min(n * kReportEpsilon, kPermanentEpsilon) + 1e-9) << n << " reports";
+    EXPECT_NEAR(lost(1), kReportEpsilon, 1e-9);
+    EXPECT_NEAR(lost(40), kPermanentEpsilon, 1e-9);
+
+    // What two reports of one text have in common, beside two of different texts, in the 256 bits: "e^5".
+    double shared = 0;
+    for (int set = 0; set <= 2; ++set) {
+        const double ways = set == 1 ? 2 : 1, together = chanceOf(set, 2, kPrivacyFlip);
+        const double apart = std::pow(kOtherBitRate, set) * std::pow(1 - kOtherBitRate, 2 - set);
+        shared += kPrivacyBits * ways * together * std::log(together / apart);
+    }
+    EXPECT_NEAR(shared, 5, 0.1);
+}
+
 /// What share of `reports` is of each candidate: the surplus of its bit, in the cohorts where it shares that with no
 /// other.
 std::vector<double> shares(const std::vector<PrivacyReport>& reports, const std::vector<std::string>& candidates,

@@ -75,7 +75,7 @@ TEST(SessionProcessing, IdentifiersBecomeNumbersAndWhatNoEventShowedIsMissing)
         {"shown, then engaged", {kLateA, kEngagedA}, "1 1 ", "", ""},
         {"shown in a section, whose identifier stays", {kEngagedA, kSectionA}, "1 kept 1 ", "", ""},
         {"a ranking shows its section, hidden, duplicate, ranked", {kRanked, kVisible}, "2 3 4 1 4 ", "", ""},
-        {"a ranker's record shows nothing", {kEngagedA, kRanker}, "1 ", "1 ", ""},
+        {"a ranker's record shows what its event leaves out", {kEngagedA, kRanker}, "1 ", "", ""},
         {"a suggestion chosen, never shown", {kChosenA}, "1 ", "", "1 "},
         {"a suggestion chosen, then shown", {kChosenA, kSuggestedA}, "1 1 ", "", ""},
         {"a suggestion shown, then chosen", {kSuggestedA, kChosenA}, "1 1 ", "", ""},

@@ -87,6 +87,8 @@ Result<std::vector<std::string>> MemoryFiles::list(const fs::path& path)
     std::vector<std::string> names;
     for (const auto& [file, contents] : files)
         if (file.parent_path() == path) names.push_back(file.filename());
+    for (const fs::path& directory : directories)
+        if (directory.parent_path() == path) names.push_back(directory.filename());
     return names;
 }
 

@@ -1,6 +1,6 @@
 // tavrinctl activity: what applications told of their use. Needs no daemon.
 
-#include <algorithm>
+#include <cerrno>
 #include <charconv>
 #include <ctime>
 
@@ -10,6 +10,7 @@
 
 #include "platform/AppActivities.h"
 #include "platform/Files.h"
+#include "platform/UrlScheme.h"
 #include "tools/tavrinctl/Commands.h"
 
 namespace tavrin::ctl {
@@ -33,10 +34,12 @@ Date now()
 /// Seconds since 1970, or a date that may have a time, which may be in UTC ("Z").
 Date dateOf(const std::string& text)
 {
+    constexpr std::int64_t kLatest = 9'000'000'000; // in 2255; a date has no room for much more
+    const auto inRange = [](std::int64_t seconds) { return seconds >= 0 && seconds <= kLatest; };
     std::int64_t seconds = 0;
     const auto number = std::from_chars(text.data(), text.data() + text.size(), seconds);
-    if (number.ec == std::errc() && number.ptr == text.data() + text.size())
-        return platform::dateFromSecondsSince1970(static_cast<double>(seconds));
+    if (number.ec == std::errc() && number.ptr == text.data() + text.size() && inRange(seconds))
+        return Date(std::chrono::seconds(seconds));
     for (const char* format :
          {"%Y-%m-%dT%H:%M:%S", "%Y-%m-%dT%H:%M", "%Y-%m-%d %H:%M:%S", "%Y-%m-%d %H:%M", "%Y-%m-%d"}) {
         std::tm time{};
@@ -47,7 +50,7 @@ Date dateOf(const std::string& text)
         const int day = time.tm_mday;
         if (zone.empty() || zone == "Z") {
             const std::time_t when = zone.empty() ? std::mktime(&time) : timegm(&time);
-            if (time.tm_mday == day) return platform::dateFromSecondsSince1970(static_cast<double>(when));
+            if (time.tm_mday == day && inRange(when)) return Date(std::chrono::seconds(when));
         }
     }
     throw Failure(
@@ -73,23 +76,18 @@ Value describe(const AppActivity& activity)
 
 std::string line(const AppActivity& activity)
 {
-    std::string text =
-        fmt::format("{}  {:<10}  {:<32}", dateText(activity.start),
-                    activity.publiclyIndexable ? "public" : "not public", printable(activity.bundleIdentifier));
+    std::string links;
     for (const auto& link : {activity.relatedUniqueIdentifier, activity.contentUrl})
-        if (link) text += "  " + printable(*link);
-    return text;
+        if (link) links += "  " + printable(*link);
+    return fmt::format("{}  {:<10}  {:<{}}{}", dateText(activity.start),
+                       activity.publiclyIndexable ? "public" : "not public", printable(activity.bundleIdentifier),
+                       links.empty() ? 0 : 32, links);
 }
 
-/// Whether the text begins with a scheme (RFC 3986, 3.1).
 bool isUrl(std::string_view text)
 {
-    const auto isLetter = [](char c) { return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z'); };
     const auto colon = text.find(':');
-    return colon != std::string_view::npos && colon > 0 && isLetter(text.front()) &&
-           std::ranges::all_of(text.substr(0, colon), [&](char c) {
-               return isLetter(c) || (c >= '0' && c <= '9') || c == '+' || c == '-' || c == '.';
-           });
+    return colon != std::string_view::npos && platform::isUrlScheme(text.substr(0, colon));
 }
 
 struct ActivityOptions {
@@ -118,15 +116,13 @@ void add(const Options& options, const ActivityOptions& mine)
 
 void list(const Options& options)
 {
-    if (!std::filesystem::exists(directory())) {
-        if (options.json) return printJson(Value::Array());
-        return printLine("No application has told anything yet; \"tavrinctl activity add\" does.");
-    }
     auto activities =
         platform::AppActivities(directory()).queryAppActivitiesAfterDate(Date::min(), Date::max(), SIZE_MAX);
+    if (!activities && activities.error().domain == platform::kPosixErrorDomain && activities.error().code == ENOENT)
+        activities.emplace();
     if (!activities)
-        throw Failure(
-            fmt::format("the activities in {} can't be read: {}", directory().string(), activities.error().reason()));
+        throw Failure(fmt::format("the activities in {} can't be read: {}; where that stays so, remove the database",
+                                  directory().string(), activities.error().reason()));
     if (options.limit > 0 && activities->size() > options.limit)
         activities->erase(activities->begin(), activities->end() - static_cast<std::ptrdiff_t>(options.limit));
     if (options.json) {
@@ -135,6 +131,7 @@ void list(const Options& options)
         return printJson(all);
     }
     for (const AppActivity& activity : *activities) printLine(line(activity));
+    if (activities->empty()) printLine("No application has told anything yet; \"tavrinctl activity add\" does.");
 }
 
 } // namespace
@@ -148,7 +145,9 @@ void addActivityCommands(CLI::App& app, Command& chosen)
     CLI::App* adding = activity->add_subcommand("add", "Tell of a use, as an application does");
     adding->add_option("--app", options->app, "The application's identifier, org.example.News")->required();
     adding->add_option("--url", options->url, "Where the content is");
-    adding->add_option("--identifier", options->identifier, "The content's unique identifier in the application");
+    adding->add_option(
+        "--identifier", options->identifier,
+        "The content's unique identifier in the application (not the client's, which is of no use here)");
     adding->add_flag("--public,!--not-public", options->isPublic,
                      "Whether the content is open to everyone; only then it is recorded. It isn't by default");
     adding->add_option("--at", options->at,
