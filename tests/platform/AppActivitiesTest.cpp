@@ -135,7 +135,7 @@ TEST_F(AppActivitiesTest, ADatabaseOfAnotherMakeIsAnErrorWhateverItHolds)
         {"ALTER TABLE app_activity DROP COLUMN content_url", false},
         {"DROP TABLE app_activity", false},
         {"CREATE VIEW app_activity AS WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n) SELECT i AS "
-         "identifier, 'a' AS app, 1 AS start, 'b' AS related_unique_identifier, 'c' AS content_url, 1 AS "
+         "identifier, 'a' AS app, i % 2 AS start, 'b' AS related_unique_identifier, 'c' AS content_url, 1 AS "
          "publicly_indexable FROM n",
          false},
         {"PRAGMA user_version = 2", false},
