@@ -14,6 +14,7 @@
 #include "bench/Support.h"
 #include "CoreTavrin/TAVReply.h"
 #include "CoreTavrin/TAVRequest.h"
+#include "CoreTavrin/TAVSessionConfiguration.h"
 
 namespace tavrin::bench {
 
