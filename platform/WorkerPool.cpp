@@ -1,7 +1,7 @@
-#include <condition_variable>
 #include <deque>
 #include <mutex>
 #include <pthread.h>
+#include <semaphore.h>
 #include <string>
 #include <sys/resource.h>
 #include <thread>
@@ -24,6 +24,24 @@ void setThreadNameForLabel(std::string_view label)
 
 namespace {
 
+/// Counts what may be taken. Unlike a condition variable it costs the one who wakes no system call more, and unlike the
+/// standard library's semaphore it never spins.
+class Tokens {
+public:
+    Tokens() { sem_init(&_semaphore, 0, 0); }
+    ~Tokens() { sem_destroy(&_semaphore); }
+    Tokens(const Tokens&) = delete;
+    Tokens& operator=(const Tokens&) = delete;
+    void give() { sem_post(&_semaphore); }
+    void take()
+    {
+        while (sem_wait(&_semaphore) != 0) {} // a signal
+    }
+
+private:
+    sem_t _semaphore;
+};
+
 /// Threads that share one line of jobs.
 class Crew {
 public:
@@ -37,51 +55,54 @@ public:
             _stopping = true;
             dropped.swap(_jobs);
         }
-        _wake.notify_all();
+        for (std::size_t i = 0; i < _threads.size(); ++i) _tokens.give();
         for (std::thread& thread : _threads) thread.join();
     }
 
     void add(Executor::Job job, bool urgent)
     {
-        bool someoneIdles = false;
         {
             std::lock_guard lock(_mutex);
             if (_stopping) return;
-            if (urgent) _jobs.push_front(std::move(job));
-            else _jobs.push_back(std::move(job));
-            someoneIdles = _idle > 0;
-            if (!someoneIdles && _threads.size() < _limit) _threads.emplace_back([this] { work(); });
+            if (urgent)
+                _jobs.push_front(std::move(job));
+            else
+                _jobs.push_back(std::move(job));
+            if (_jobs.size() > _idle && _threads.size() < _limit) {
+                ++_idle;
+                _threads.emplace_back([this] { work(); });
+            }
         }
-        // Without the mutex, which the worker that wakes needs.
-        if (someoneIdles) _wake.notify_one();
+        _tokens.give(); // without the mutex, which the worker that wakes needs
     }
 
 private:
     void work()
     {
         if (_nice > 0) setpriority(PRIO_PROCESS, 0, _nice); // 0: this thread
-        std::unique_lock lock(_mutex);
         while (true) {
-            ++_idle;
-            _wake.wait(lock, [this] { return _stopping || !_jobs.empty(); });
-            --_idle;
-            if (_stopping) return;
+            _tokens.take();
+            Executor::Job job;
             {
-                Executor::Job job = std::move(_jobs.front());
+                std::lock_guard lock(_mutex);
+                if (_stopping) return;
+                --_idle;
+                job = std::move(_jobs.front());
                 _jobs.pop_front();
-                lock.unlock();
-                job();
             }
-            lock.lock();
+            job();
+            job = {};
+            std::lock_guard lock(_mutex);
+            ++_idle;
         }
     }
 
     const unsigned _limit;
     const int _nice;
+    Tokens _tokens; // one for each job
     std::mutex _mutex;
-    std::condition_variable _wake;
     std::deque<Executor::Job> _jobs;
-    unsigned _idle = 0;
+    std::size_t _idle = 0; ///< threads that are not in a job
     bool _stopping = false;
     std::vector<std::thread> _threads;
 };
