@@ -28,6 +28,9 @@ constexpr std::string_view kBodySuffix = ".body";
 constexpr std::uint64_t kEntrySize = 1024;
 /// Uses are saved with the next change, and when there are so many.
 constexpr std::size_t kMaximumUnsavedUses = 256;
+/// Mappings are kept, for making one may cost many times what is read through it; so many, and bytes of all of them.
+constexpr std::size_t kMaximumMappings = 64;
+constexpr std::size_t kMostMapped = 16u << 20;
 
 /// The small table is read whole when the index is opened, and written with every use.
 constexpr std::array kSchema{
@@ -188,6 +191,7 @@ Result<void> HttpCacheStore::beginAnew()
 {
     _index.reset();
     _uses.clear();
+    _mappings.clear();
     for (const std::string& name : makeSystemFiles()->list(_directory).value_or(std::vector<std::string>()))
         if (idOf(name) || name == kTemporary || name.starts_with(kIndex))
             unlinkat(_lock.directory.fd(), name.c_str(), 0);
@@ -418,25 +422,41 @@ Result<void> HttpCacheStore::writeBody(std::int64_t id, std::string_view body) c
     return failed;
 }
 
-/// None where the file isn't there whole.
-std::optional<Bytes> HttpCacheStore::mapBody(std::int64_t id, std::uint64_t size) const
+/// None where the file isn't there whole. A mapping that was kept is read only where its file still is.
+std::optional<Bytes> HttpCacheStore::mapBody(std::int64_t id, std::uint64_t size)
 {
-    const FileHandle file(
-        openat(_lock.directory.fd(), nameOf(id).c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
     struct stat status {};
+    const std::string name = nameOf(id);
+    if (const auto kept = std::ranges::find(_mappings, id, &Mapping::id); kept != _mappings.end()) {
+        if (fstatat(_lock.directory.fd(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0 &&
+            status.st_ino == kept->inode && static_cast<std::uint64_t>(status.st_size) == size &&
+            kept->body.size() == size) {
+            _mappings.splice(_mappings.begin(), _mappings, kept);
+            return kept->body;
+        }
+        _mappings.erase(kept);
+    }
+    const FileHandle file(openat(_lock.directory.fd(), name.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
     if (!file || fstat(file.fd(), &status) != 0 || !S_ISREG(status.st_mode) ||
         static_cast<std::uint64_t>(status.st_size) != size)
         return std::nullopt;
     if (size == 0) return Bytes();
     void* bytes = mmap(nullptr, size, PROT_READ, MAP_PRIVATE | MAP_POPULATE, file.fd(), 0);
     if (bytes == MAP_FAILED) return std::nullopt;
-    return Bytes(
+    Bytes body(
         std::shared_ptr<const void>(bytes, [size](const void* mapped) { munmap(const_cast<void*>(mapped), size); }),
         std::string_view(static_cast<const char*>(bytes), size));
+    _mappings.push_front({id, status.st_ino, body});
+    std::size_t all = 0;
+    for (const Mapping& mapping : _mappings) all += mapping.body.size();
+    for (; _mappings.size() > kMaximumMappings || all > kMostMapped; _mappings.pop_back())
+        all -= _mappings.back().body.size();
+    return body;
 }
 
-void HttpCacheStore::removeBody(std::int64_t id) const
+void HttpCacheStore::removeBody(std::int64_t id)
 {
+    std::erase_if(_mappings, [id](const Mapping& mapping) { return mapping.id == id; });
     unlinkat(_lock.directory.fd(), nameOf(id).c_str(), 0);
 }
 

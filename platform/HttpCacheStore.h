@@ -2,6 +2,7 @@
 
 #include <cstdint>
 #include <filesystem>
+#include <list>
 #include <map>
 #include <memory>
 #include <optional>
@@ -52,14 +53,19 @@ public:
 
 private:
     struct Row;
+    struct Mapping {
+        std::int64_t id;
+        std::uint64_t inode;
+        Bytes body;
+    };
     HttpCacheStore(std::filesystem::path directory, const Limits& limits, LockedDirectory lock)
         : _directory(std::move(directory)), _limits(limits), _lock(std::move(lock))
     {}
     [[nodiscard]] Result<void> openIndex();
     [[nodiscard]] Result<void> sweep();
     [[nodiscard]] Result<void> writeBody(std::int64_t id, std::string_view body) const;
-    [[nodiscard]] std::optional<Bytes> mapBody(std::int64_t id, std::uint64_t size) const;
-    void removeBody(std::int64_t id) const;
+    [[nodiscard]] std::optional<Bytes> mapBody(std::int64_t id, std::uint64_t size);
+    void removeBody(std::int64_t id);
     /// Forgets the entries; their files go with `removeBody`, once that has been committed.
     [[nodiscard]] Result<void> forget(const std::vector<std::int64_t>& ids);
     [[nodiscard]] Result<void> saveUses();
@@ -72,6 +78,7 @@ private:
     std::uint64_t _size = 0; // of all entries
     std::int64_t _lastUse = 0;
     std::map<std::string, std::int64_t> _uses; // not in the index yet
+    std::list<Mapping> _mappings;              // of the bodies found last, the latest first
 };
 
 } // namespace platform

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <csignal>
 #include <fcntl.h>
+#include <fstream>
 #include <sys/resource.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -307,7 +308,7 @@ TEST_F(HttpCacheTest, DamageIsDroppedAndNeverAnswered)
             open();
             store(1, kSmall);
             store(2, kLarge);
-            executor.drain();
+            EXPECT_EQ(find(2), kLarge);
             if (!running) cache.reset();
             spoilAll(c.spoil);
             if (!running) open();
@@ -322,6 +323,32 @@ TEST_F(HttpCacheTest, DamageIsDroppedAndNeverAnswered)
             fs::remove_all(directory / "http");
         }
     }
+}
+
+TEST_F(HttpCacheTest, SoManyMappingsAreKeptOnly)
+{
+    open(0, 100u << 20);
+    for (int round = 0; round < 2; ++round) {
+        for (int i = 0; i < 100; ++i) {
+            if (round == 0) store(i, kLarge + std::to_string(i));
+            EXPECT_EQ(find(i), kLarge + std::to_string(i));
+        }
+    }
+    const auto mapped = [] {
+        std::ifstream maps("/proc/self/maps");
+        int count = 0;
+        for (std::string line; std::getline(maps, line);) count += line.ends_with(".body") ? 1 : 0;
+        return count;
+    };
+    EXPECT_EQ(mapped(), 64);
+    for (int i = 0; i < 5; ++i) {
+        store(i, std::string(5u << 20, 'x'));
+        (void)find(i);
+    }
+    EXPECT_EQ(mapped(), 3) << "more would be too large";
+    cache.reset();
+    executor.drain();
+    EXPECT_EQ(mapped(), 0);
 }
 
 TEST_F(HttpCacheTest, OneDamagedBodyCostsNoOther)
