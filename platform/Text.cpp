@@ -1,8 +1,9 @@
 #include "platform/Text.h"
 
 #include <algorithm>
+#include <bit>
 #include <cstdint>
-#include <numeric>
+#include <utility>
 
 #include <unicode/brkiter.h>
 #include <unicode/bytestream.h>
@@ -22,9 +23,15 @@ std::size_t utf16Length(std::string_view text)
     std::size_t units = 0;
     for (std::size_t i = 0; i < text.size();) {
         const auto lead = static_cast<unsigned char>(text[i]);
-        const std::size_t length = lead < 0x80 ? 1 : lead < 0xc2 ? 0 : lead < 0xe0 ? 2 : lead < 0xf0 ? 3 : lead < 0xf5 ? 4 : 0;
+        const std::size_t length = lead < 0x80   ? 1
+                                   : lead < 0xc2 ? 0
+                                   : lead < 0xe0 ? 2
+                                   : lead < 0xf0 ? 3
+                                   : lead < 0xf5 ? 4
+                                                 : 0;
         bool valid = length > 0 && i + length <= text.size();
-        for (std::size_t k = 1; valid && k < length; ++k) valid = (static_cast<unsigned char>(text[i + k]) & 0xc0) == 0x80;
+        for (std::size_t k = 1; valid && k < length; ++k)
+            valid = (static_cast<unsigned char>(text[i + k]) & 0xc0) == 0x80;
         units += valid && length == 4 ? 2 : 1;
         i += valid ? length : 1;
     }
@@ -48,7 +55,8 @@ std::string lowerCased(std::string_view text)
     }
     icu::StringByteSink<std::string> sink(&result);
     UErrorCode status = U_ZERO_ERROR;
-    icu::CaseMap::utf8ToLower("", 0, icu::StringPiece(text.data(), static_cast<int32_t>(text.size())), sink, nullptr, status);
+    icu::CaseMap::utf8ToLower("", 0, icu::StringPiece(text.data(), static_cast<int32_t>(text.size())), sink, nullptr,
+                              status);
     return result;
 }
 
@@ -106,36 +114,42 @@ std::vector<std::string> WordFinder::wordsIn(std::string_view text)
     icu::BreakIterator* iterator = _impl->iterator.get();
     if (!iterator) return {};
     const icu::UnicodeString whole = unicode(text);
+    std::string utf8;
+    whole.toUTF8String(utf8);
+    std::size_t byte = 0;
+    int32_t unit = 0;
+    const auto byteOf = [&](int32_t end) { // of a place that isn't before the last one
+        for (; unit < end; byte += static_cast<std::size_t>(U8_COUNT_TRAIL_BYTES(utf8[byte])) + 1)
+            unit += static_cast<unsigned char>(utf8[byte]) < 0xf0 ? 1 : 2;
+        return byte;
+    };
     iterator->setText(whole);
     std::vector<std::string> words;
     int32_t begin = iterator->first();
-    for (int32_t end = iterator->next(); end != icu::BreakIterator::DONE; begin = end, end = iterator->next())
-        if (iterator->getRuleStatus() >= UBRK_WORD_NONE_LIMIT)
-            whole.tempSubStringBetween(begin, end).toUTF8String(words.emplace_back());
+    for (int32_t end = iterator->next(); end != icu::BreakIterator::DONE; begin = end, end = iterator->next()) {
+        if (iterator->getRuleStatus() < UBRK_WORD_NONE_LIMIT) continue;
+        const std::size_t first = byteOf(begin);
+        words.emplace_back(utf8, first, byteOf(end) - first);
+    }
     return words;
 }
 
 namespace {
+
+constexpr std::uint32_t kNoElement = UINT32_MAX;
 
 /// What a text compares as: a weight, of the characters in [begin, end). The second and later weights of a character
 /// are of no characters.
 struct Element {
     std::uint32_t weight;
     int32_t begin, end;
+    std::uint32_t next = kNoElement; // in the same bucket
 };
 
-/// Accents count, case doesn't: the primary and secondary bits of ICU's weights.
-constexpr std::uint32_t kCounts = 0xffffff00;
-
-template <class Take> void eachElement(icu::CollationElementIterator& iterator, Take take)
+/// Of the orders that ICU's iterators give, what counts: accents do, case doesn't. 0 of what counts for nothing.
+std::uint32_t weightOf(int32_t order)
 {
-    UErrorCode status = U_ZERO_ERROR;
-    for (int32_t begin = iterator.getOffset();; begin = iterator.getOffset()) {
-        const int32_t order = iterator.next(status);
-        if (U_FAILURE(status) || order == icu::CollationElementIterator::NULLORDER) return;
-        const std::uint32_t weight = static_cast<std::uint32_t>(order) & kCounts;
-        if (weight != 0) take(Element{weight, begin, iterator.getOffset()});
-    }
+    return static_cast<std::uint32_t>(order) & 0xffffff00;
 }
 
 /// Whether a user takes what is before `at` and what is behind it for different characters. False where that would need
@@ -155,7 +169,7 @@ struct LocalizedSearch::Impl {
     icu::UnicodeString text;
     std::unique_ptr<icu::RuleBasedCollator> collator;            // null where ICU has none
     std::vector<Element> elements;                               // of the text
-    std::vector<std::uint32_t> places;                           // in `elements`, by weight
+    std::vector<std::uint32_t> buckets;                          // first elements, by weight and next weight
     std::unique_ptr<icu::CollationElementIterator> partIterator; // null where the index isn't used
     std::vector<std::uint32_t> part;
 
@@ -176,10 +190,25 @@ struct LocalizedSearch::Impl {
         const std::unique_ptr<icu::CollationElementIterator> iterator(collator->createCollationElementIterator(text));
         partIterator.reset(collator->createCollationElementIterator(icu::UnicodeString()));
         if (!iterator || !partIterator) return partIterator.reset();
-        eachElement(*iterator, [this](const Element& element) { elements.push_back(element); });
-        places.resize(elements.size());
-        std::iota(places.begin(), places.end(), 0u);
-        std::ranges::stable_sort(places, {}, [this](std::uint32_t place) { return elements[place].weight; });
+        UErrorCode status = U_ZERO_ERROR;
+        int32_t begin = 0;
+        for (int32_t order; (order = iterator->next(status)) != icu::CollationElementIterator::NULLORDER;) {
+            if (U_FAILURE(status)) return partIterator.reset();
+            const int32_t end = iterator->getOffset();
+            if (const std::uint32_t weight = weightOf(order)) elements.push_back({weight, begin, end});
+            begin = end;
+        }
+        buckets.resize(std::bit_ceil(elements.size() + 1), kNoElement);
+        for (std::size_t i = elements.size(); i-- > 1;) {
+            std::uint32_t& first = buckets[bucketOf(elements[i - 1].weight, elements[i].weight)];
+            elements[i - 1].next = std::exchange(first, static_cast<std::uint32_t>(i - 1));
+        }
+    }
+
+    [[nodiscard]] std::size_t bucketOf(std::uint32_t weight, std::uint32_t next) const
+    {
+        constexpr std::uint64_t kMix = 0x9e3779b97f4a7c15;
+        return ((weight * kMix ^ next) * kMix >> 32) & (buckets.size() - 1);
     }
 
     enum class Found { No, Yes, Perhaps };
@@ -189,14 +218,18 @@ struct LocalizedSearch::Impl {
         UErrorCode status = U_ZERO_ERROR;
         partIterator->setText(pattern, status);
         part.clear();
-        eachElement(*partIterator, [this](const Element& element) { part.push_back(element.weight); });
-        if (U_FAILURE(status)) return Found::Perhaps;
+        for (int32_t order; (order = partIterator->next(status)) != icu::CollationElementIterator::NULLORDER;) {
+            if (U_FAILURE(status)) return Found::Perhaps;
+            if (const std::uint32_t weight = weightOf(order)) part.push_back(weight);
+        }
         if (part.empty()) return Found::No;
+        const bool single = part.size() == 1; // rare
         Found found = Found::No;
-        for (const std::uint32_t place :
-             std::ranges::equal_range(places, part[0], {}, [this](std::uint32_t p) { return elements[p].weight; })) {
+        for (std::size_t place = single ? 0 : buckets[bucketOf(part[0], part[1])]; place < elements.size();
+             place = single ? place + 1 : elements[place].next) {
             if (elements.size() - place < part.size()) continue;
-            const auto begin = elements.begin() + place, end = begin + static_cast<std::ptrdiff_t>(part.size());
+            const auto begin = elements.begin() + static_cast<std::ptrdiff_t>(place),
+                       end = begin + static_cast<std::ptrdiff_t>(part.size());
             if (!std::equal(part.begin(), part.end(), begin, [](auto weight, auto& e) { return weight == e.weight; }))
                 continue;
             const bool whole = begin->begin < begin->end && (end == elements.end() || end->begin < end->end);

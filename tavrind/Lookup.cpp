@@ -1,8 +1,10 @@
 #include "tavrind/Lookup.h"
 
 #include <algorithm>
-#include <map>
+#include <iterator>
 #include <string_view>
+#include <unordered_set>
+#include <utility>
 #include <vector>
 
 #include "CoreTavrin/TAVBag.h"
@@ -54,40 +56,43 @@ float numberIn(const Value& value)
 /// The weights of those keywords that the text has, each once; of a word that comes twice the last weight counts.
 float keywordScore(const Value& keywords, const platform::LocalizedSearch& context)
 {
-    std::map<std::string_view, float> weights;
-    if (const Value::Array* array = keywords.asArray())
-        for (const Value& keyword : *array)
-            if (const std::string* word = keyword["word"].asString())
-                weights.insert_or_assign(*word, numberIn(keyword["weight"]));
+    const Value::Array* array = keywords.asArray();
+    if (!array) return 0;
+    std::vector<std::pair<std::string_view, float>> weights;
+    weights.reserve(array->size());
+    for (const Value& keyword : *array)
+        if (const std::string* word = keyword["word"].asString())
+            weights.emplace_back(*word, numberIn(keyword["weight"]));
+    const auto wordIn = [](const auto& entry) { return entry.first; };
+    std::ranges::stable_sort(weights, {}, wordIn);
     float score = 0;
-    for (const auto& [word, weight] : weights)
-        if (context.contains(word)) score += weight;
+    for (auto each = weights.begin(); each != weights.end(); ++each) {
+        const bool last = std::next(each) == weights.end() || wordIn(*std::next(each)) != wordIn(*each);
+        if (last && context.contains(each->first)) score += each->second;
+    }
     return score;
 }
 
-/// Each word once, in their order.
-std::vector<std::string> distinct(std::vector<std::string> words)
-{
-    std::ranges::sort(words);
-    const auto rest = std::ranges::unique(words);
-    words.erase(rest.begin(), rest.end());
-    return words;
-}
-
 /// Of the distinct words of two texts, how many of all are in both.
-float jaccardIndex(const std::vector<std::string>& a, const std::vector<std::string>& b)
+float jaccardIndex(const std::unordered_set<std::string_view>& context, const std::vector<std::string>& subjectWords)
 {
-    const auto shared = std::ranges::count_if(b, [&](auto& word) { return std::ranges::binary_search(a, word); });
-    const std::size_t all = a.size() + b.size() - static_cast<std::size_t>(shared);
+    std::vector<std::string_view> subject(subjectWords.begin(), subjectWords.end());
+    std::ranges::sort(subject, [](auto a, auto b) { return a.size() != b.size() ? a.size() < b.size() : a < b; });
+    const auto repeated = std::ranges::unique(subject);
+    subject.erase(repeated.begin(), repeated.end());
+    const auto shared = std::ranges::count_if(subject, [&](const auto& word) { return context.contains(word); });
+    const std::size_t all = context.size() + subject.size() - static_cast<std::size_t>(shared);
     return all == 0 ? 0 : static_cast<float>(shared) / static_cast<float>(all);
 }
 
 /// What results are measured against: the text around the word that is looked up.
 class LookupContext {
 public:
-    LookupContext(std::string_view text, const std::string& locale)
-        : _search(text, locale), _finder(locale), _words(distinct(_finder.wordsIn(text)))
-    {}
+    LookupContext(std::string_view text, const std::string& locale) : _search(text, locale), _finder(locale)
+    {
+        _text = _finder.wordsIn(text);
+        _words.insert(_text.begin(), _text.end());
+    }
 
     [[nodiscard]] bool keeps(const Value& instructions)
     {
@@ -103,8 +108,7 @@ public:
         const float subjectMinimum = numberIn(instructions["min_subject_score"]);
         if (subjectMinimum == 0) return true;
         const std::string* subject = instructions["subject"].asString();
-        const float index =
-            !subject || subject->empty() ? 0 : jaccardIndex(_words, distinct(_finder.wordsIn(*subject)));
+        const float index = !subject || subject->empty() ? 0 : jaccardIndex(_words, _finder.wordsIn(*subject));
         if (subjectMinimum > index) {
             log().debug("dropping lookup result. jaccard index: {:f} min subject score: {:f}", index, subjectMinimum);
             return false;
@@ -115,7 +119,8 @@ public:
 private:
     platform::LocalizedSearch _search;
     platform::WordFinder _finder;
-    std::vector<std::string> _words; // distinct
+    std::vector<std::string> _text;
+    std::unordered_set<std::string_view> _words; // of the text
 };
 
 } // namespace
