@@ -151,7 +151,9 @@ std::vector<Row> images()
         const double begin = now();
         const auto loaded = endpoint->loadImages(described, std::chrono::seconds(30));
         const double end = now();
-        require(loaded && loaded->size() == kImages && loaded->begin()->second.size() == kSize, "24 images");
+        require(loaded && loaded->size() == kImages && loaded->begin()->second.size() == kSize,
+                loaded ? fmt::format("{} images of {} in {}", loaded->size(), kImages, seconds(end - begin))
+                       : "images: " + loaded.error().description());
         return end - begin;
     };
     const auto beside = [&] {
