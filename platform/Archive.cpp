@@ -177,7 +177,7 @@ struct Head {
     std::uint32_t number = 0; ///< where the first byte has it
 };
 
-/// The format's table of first bytes: https://github.com/msgpack/msgpack/blob/master/spec.md
+/// MessagePack's table of first bytes (https://msgpack.org).
 constexpr Head headOf(unsigned first)
 {
     using enum Value::Type;

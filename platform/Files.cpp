@@ -16,6 +16,7 @@
 #include <fmt/format.h>
 
 #include "platform/Uuid.h"
+#include "platform/WriteAll.h"
 
 namespace platform {
 
@@ -64,16 +65,6 @@ template <class Call> auto retried(Call call)
 Date dateOf(const statx_timestamp& time)
 {
     return Date(std::chrono::seconds(time.tv_sec) + std::chrono::nanoseconds(time.tv_nsec));
-}
-
-bool writeAll(int fd, std::string_view contents)
-{
-    while (!contents.empty()) {
-        const ssize_t written = retried([&] { return write(fd, contents.data(), contents.size()); });
-        if (written < 0) return false;
-        contents.remove_prefix(static_cast<std::size_t>(written));
-    }
-    return true;
 }
 
 bool copyAll(int from, int to)
@@ -308,6 +299,16 @@ fs::path home()
 }
 
 } // namespace
+
+bool writeAll(int fd, std::string_view contents)
+{
+    while (!contents.empty()) {
+        const ssize_t written = retried([&] { return write(fd, contents.data(), contents.size()); });
+        if (written < 0) return false;
+        contents.remove_prefix(static_cast<std::size_t>(written));
+    }
+    return true;
+}
 
 Result<LockedDirectory> LockedDirectory::open(const fs::path& path)
 {

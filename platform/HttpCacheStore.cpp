@@ -14,6 +14,7 @@
 #include <sqlite3.h>
 
 #include "platform/Log.h"
+#include "platform/WriteAll.h"
 
 namespace platform {
 
@@ -410,13 +411,8 @@ Result<void> HttpCacheStore::writeBody(std::int64_t id, std::string_view body) c
     const int directory = _lock.directory.fd();
     const FileHandle file(
         openat(directory, kTemporary, O_WRONLY | O_CREAT | O_TRUNC | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, 0600));
-    bool written = static_cast<bool>(file);
-    while (written && !body.empty()) {
-        const ssize_t count = write(file.fd(), body.data(), body.size());
-        written = count >= 0 || errno == EINTR;
-        if (count > 0) body.remove_prefix(static_cast<std::size_t>(count));
-    }
-    if (written && renameat(directory, kTemporary, directory, nameOf(id).c_str()) == 0) return {};
+    if (file && writeAll(file.fd(), body) && renameat(directory, kTemporary, directory, nameOf(id).c_str()) == 0)
+        return {};
     auto failed = failure(_directory / nameOf(id));
     unlinkat(directory, kTemporary, 0);
     return failed;

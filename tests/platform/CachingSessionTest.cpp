@@ -1,8 +1,5 @@
 #include <gtest/gtest.h>
 
-#include <barrier>
-#include <thread>
-
 #include "platform/CachingSession.h"
 #include "platform/HttpCache.h"
 #include "tests/support/FakeUrlLoader.h"
@@ -328,17 +325,7 @@ TEST_F(CachingLoaderTest, ACancelThatRacesWithTheRestIsNeverLostOrDoubled)
         const char* path = i % 3 == 0 ? "/fresh" : i % 3 == 1 ? "/old" : "/hang";
         loads.push_back(std::make_unique<Load>(*session, UrlRequest{.url = server.url(path)}, queue));
     }
-    std::barrier together(2);
-    const auto each = [&](void (UrlTask::*call)()) {
-        for (const auto& one : loads) {
-            together.arrive_and_wait();
-            (*one->task.*call)();
-        }
-    };
-    {
-        std::jthread resuming(each, &UrlTask::resume);
-        std::jthread cancelling(each, &UrlTask::cancel);
-    }
+    resumeWhileCancelling(loads);
     for (std::size_t i = 0; i < loads.size(); ++i) {
         const auto code = loads[i]->wait().code();
         EXPECT_TRUE(code == kUrlCancelled || (code == 0 && i % 3 != 2)) << i << ": " << code;

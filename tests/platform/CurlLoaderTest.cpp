@@ -1,7 +1,6 @@
 #include <gtest/gtest.h>
 
 #include <arpa/inet.h>
-#include <barrier>
 #include <net/if.h>
 #include <sched.h>
 #include <sys/ioctl.h>
@@ -442,17 +441,7 @@ TEST_F(CurlLoaderTest, ACancelThatRacesWithTheRestIsNeverLostOrDoubled)
     for (int i = 0; i < 200; ++i)
         loads.push_back(
             std::make_unique<Load>(*session, UrlRequest{.url = server.url(i % 2 ? "/hang" : "/end")}, queue));
-    std::barrier together(2);
-    const auto each = [&](void (UrlTask::*call)()) {
-        for (const auto& one : loads) {
-            together.arrive_and_wait();
-            (*one->task.*call)();
-        }
-    };
-    {
-        std::jthread resuming(each, &UrlTask::resume);
-        std::jthread cancelling(each, &UrlTask::cancel);
-    }
+    resumeWhileCancelling(loads);
     for (std::size_t i = 0; i < loads.size(); ++i) {
         const auto code = loads[i]->wait().code();
         if (i % 2 || code != 0) {

@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
+#include <barrier>
 #include <chrono>
 #include <cstdlib>
 #include <future>
@@ -10,6 +11,8 @@
 #include <optional>
 #include <stdexcept>
 #include <string>
+#include <thread>
+#include <vector>
 
 #include "platform/Queue.h"
 #include "platform/UrlSession.h"
@@ -64,6 +67,20 @@ private:
     };
     std::shared_ptr<State> _state = std::make_shared<State>();
 };
+
+/// Resumes and cancels each of them from two threads at a time.
+inline void resumeWhileCancelling(const std::vector<std::unique_ptr<Load>>& loads)
+{
+    std::barrier together(2);
+    const auto each = [&](void (UrlTask::*call)()) {
+        for (const auto& one : loads) {
+            together.arrive_and_wait();
+            (*one->task.*call)();
+        }
+    };
+    std::jthread resuming(each, &UrlTask::resume);
+    std::jthread cancelling(each, &UrlTask::cancel);
+}
 
 /// Tests of the real loader: a session for each load, and a worker pool for the completions.
 struct UrlLoads : testing::Test {
