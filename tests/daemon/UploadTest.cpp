@@ -327,7 +327,8 @@ TEST_F(UploadTest, WhicheverWriteFailsOnlyWhatItHeldIsLost)
             expectBooksClose();
             EXPECT_EQ(typesIn(decoded(*uploadOne())), (Types{"search_view_appear", "session_end"})) << lost.size();
         }
-        // The directory, the file, its version and header; the events; the upload's body. Two more hold no event.
+        // The directory, the file, its version and header; the events; the directory of the state, which has none of
+        // them; the upload's body; that directory.
         EXPECT_EQ(lost, (std::vector<std::size_t>{4, 4, 4, 4, 1, 1, 1, 1, 0, 4, 4, 0})) << error;
     }
 }
