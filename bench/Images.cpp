@@ -86,7 +86,14 @@ public:
         }
         for (int running = 1; running > 0;) {
             if (curl_multi_perform(_multi, &running) != CURLM_OK) std::abort();
-            if (running > 0) curl_multi_poll(_multi, nullptr, 0, 1000, nullptr);
+            int ready = 0;
+            if (running > 0) curl_multi_poll(_multi, nullptr, 0, 2, &ready);
+            if (running == 0 || ready > 0) continue;
+            for (CURL* easy : _easies) { // libcurl 7.88 may have read what it doesn't tell: as the daemon does
+                curl_easy_pause(easy, CURLPAUSE_RECV);
+                curl_easy_pause(easy, CURLPAUSE_CONT);
+                if (curl_multi_perform(_multi, &running) != CURLM_OK) std::abort();
+            }
         }
         for (std::size_t i = 0; i < urls.size(); ++i) {
             long version = 0;
@@ -112,7 +119,9 @@ std::vector<Row> images()
     const auto ready = platform::parseJson(service.firstLine()).value();
     const std::string http = *ready["http"].asString();
     const std::uint16_t port = freePort();
-    const Process proxy({NGHTTPX, "--conf=/dev/null", "--workers=1", fmt::format("--frontend=127.0.0.1,{}", port),
+    const Process proxy({NGHTTPX, "--conf=/dev/null", "--workers=1",
+                         // Of either client, or one would keep those that the service serves at a time from the other.
+                         "--backend-connections-per-frontend=16", fmt::format("--frontend=127.0.0.1,{}", port),
                          fmt::format("--backend=127.0.0.1,{}", http.substr(http.rfind(':') + 1)),
                          "--errorlog-file=/dev/null", "--accesslog-file=/dev/null", (certificates / "key.pem").string(),
                          (certificates / "cert.pem").string()},
