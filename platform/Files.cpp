@@ -9,6 +9,7 @@
 #include <pwd.h>
 #include <span>
 #include <sys/file.h>
+#include <sys/mman.h>
 #include <sys/stat.h>
 #include <sys/uio.h>
 #include <unistd.h>
@@ -241,16 +242,10 @@ public:
         return std::make_unique<SystemAppendFile>(std::move(file));
     }
 
-    Result<FileHandle> createTemporary(const fs::path& directory) override
+    Result<FileHandle> createTemporary() override
     {
-        FileHandle file(retried([&] { return open(directory.c_str(), O_TMPFILE | O_RDWR | O_CLOEXEC, 0600); }));
-        if (file) return file;
-        if (errno != EOPNOTSUPP && errno != EISDIR) return failure(directory);
-        // A file system, or a kernel, that knows no files without a name.
-        const fs::path path = directory / (Uuid::random().string() + ".tmp");
-        file = FileHandle(
-            retried([&] { return open(path.c_str(), O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600); }));
-        if (!file || unlink(path.c_str()) != 0) return failure(path);
+        FileHandle file(memfd_create("temporary", MFD_CLOEXEC));
+        if (!file) return failure("memfd:temporary");
         return file;
     }
 

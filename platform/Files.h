@@ -82,9 +82,9 @@ public:
     [[nodiscard]] virtual Result<FileHandle> openForReading(const std::filesystem::path& path) = 0;
     /// Makes a new, empty file, mode 0600, and opens it; one that is there already is an error (EEXIST).
     [[nodiscard]] virtual Result<std::unique_ptr<AppendFile>> createForAppending(const std::filesystem::path& path) = 0;
-    /// A new, empty file in a directory that is there, without a name, for reading and writing: it goes with its last
-    /// user.
-    [[nodiscard]] virtual Result<FileHandle> createTemporary(const std::filesystem::path& directory) = 0;
+    /// A new, empty file in memory, for reading and writing: it goes with its last user. Without a name, for making one
+    /// in a directory and removing it may take a file system's journal a quarter of a millisecond.
+    [[nodiscard]] virtual Result<FileHandle> createTemporary() = 0;
 };
 
 [[nodiscard]] std::unique_ptr<FileSystem> makeSystemFiles();

@@ -194,7 +194,7 @@ void ClientStateManager::_startImageFetch(const ImageFetch& fetch)
         .url = fetch.url,
         .transaction = device.transactions.begin("imageFetch"),
         .start = startNetworkSearchFeedback("", request, StartSearchTrigger::ImageLoad, EndpointType::TavrinImage),
-        .file = device.files.createTemporary(device.directories.temporary),
+        .file = device.files.createTemporary(),
         .task = {}});
     _addImageFeedback(load->start);
 

@@ -102,9 +102,9 @@ Result<FileHandle> MemoryFiles::openForReading(const fs::path& path)
     return handle;
 }
 
-Result<FileHandle> MemoryFiles::createTemporary(const fs::path& directory)
+Result<FileHandle> MemoryFiles::createTemporary()
 {
-    if (const int error = faultOf("temporary", directory)) return std::unexpected(Error::posix(error));
+    if (const int error = faultOf("temporary", {})) return std::unexpected(Error::posix(error));
     return FileHandle(memfd_create("temporary", MFD_CLOEXEC));
 }
 

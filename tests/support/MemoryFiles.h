@@ -31,7 +31,7 @@ public:
     Result<std::vector<std::string>> list(const std::filesystem::path& path) override;
     Result<FileHandle> openForReading(const std::filesystem::path& path) override;
     Result<std::unique_ptr<AppendFile>> createForAppending(const std::filesystem::path& path) override;
-    Result<FileHandle> createTemporary(const std::filesystem::path& directory) override;
+    Result<FileHandle> createTemporary() override;
 
 private:
     class Appending;

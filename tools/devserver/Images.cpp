@@ -1,7 +1,9 @@
 #include "tools/devserver/Images.h"
 
+#include <algorithm>
 #include <array>
 #include <cstdint>
+#include <cstring>
 #include <random>
 
 #include <zlib.h>
@@ -39,7 +41,10 @@ std::string noise(std::uint64_t seed, std::size_t size)
 {
     std::mt19937_64 generator(seed);
     std::string bytes(size, '\0');
-    for (char& byte : bytes) byte = static_cast<char>(generator() & 0xFF);
+    for (std::size_t i = 0; i < size; i += sizeof(std::uint64_t)) {
+        const std::uint64_t word = generator();
+        std::memcpy(bytes.data() + i, &word, std::min(size - i, sizeof word));
+    }
     return bytes;
 }
 
