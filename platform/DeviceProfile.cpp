@@ -36,8 +36,11 @@ public:
         std::lock_guard lock(_mutex);
         if (!_profile) {
             _profile = read();
-            // Made on the loop's thread, where it must live.
-            _runLoop.execute(Priority::Default, [this] { _watch.emplace(_runLoop, _path, [this] { changed(); }); });
+            // Made on the loop's thread, where it must live; what changed until then is looked for once.
+            _runLoop.execute(Priority::Default, [this] {
+                _watch.emplace(_runLoop, _path, [this] { changed(); });
+                changed();
+            });
         }
         return *_profile;
     }
@@ -79,9 +82,9 @@ private:
     const std::filesystem::path _path;
     RunLoop& _runLoop;
     std::mutex _mutex;
-    std::optional<DeviceProfile> _profile;                             // under the mutex
+    std::optional<DeviceProfile> _profile;                            // under the mutex
     std::vector<std::function<void(const DeviceProfile&)>> _handlers; // under the mutex
-    std::optional<FileWatch> _watch;                                   // loop's thread
+    std::optional<FileWatch> _watch;                                  // loop's thread
 };
 
 } // namespace

@@ -57,9 +57,11 @@ public:
         const bool watched = static_cast<bool>(_handler);
         _handler = std::move(handler);
         if (watched) return;
-        // Made on the loop's thread, where it must live.
-        _runLoop.execute(Priority::Default,
-                         [this] { _watch.emplace(_runLoop, _directory / "", [this] { changed(); }); });
+        // Made on the loop's thread, where it must live; what changed until then is looked for once.
+        _runLoop.execute(Priority::Default, [this] {
+            _watch.emplace(_runLoop, _directory / "", [this] { changed(); });
+            changed();
+        });
     }
 
 private:

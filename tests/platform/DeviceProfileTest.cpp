@@ -79,6 +79,15 @@ TEST_F(DeviceProfileTest, AChangedFileIsToldOnceAndABrokenOneIsEmpty)
     writeFile(directory / "app/marker", "");
     loop.runOnce(std::chrono::seconds(1));
     EXPECT_EQ(told.size(), 3u) << "another file that says the same is no change";
+
+    for (const char* country : {"AT", "LI"}) { // both: the new directory is watched, too
+        std::filesystem::remove_all(directory / "app");
+        std::filesystem::create_directory(directory / "app");
+        for (const std::string& now : {std::string(country), std::string("X")}) {
+            writeFile(directory / "app/device.json", R"({"countryCode": ")" + now + "\"}");
+            EXPECT_TRUE(test::runUntil(loop, [&] { return told.back() == now; })) << country << " " << now;
+        }
+    }
 }
 
 } // namespace

@@ -51,6 +51,7 @@ TEST(Subscriptions, AreReadFromSoundFilesAndWatched)
     const SubscriptionQuery query{.bundleIdentifiers = {"a"}, .maximumExpiration = 24h * 36500};
     EXPECT_TRUE(subscriptions->activeServices(query)->empty()) << "no directory";
     loop.runOnce(Duration::zero()); // the watch is there now
+    EXPECT_EQ(std::exchange(told, 0), 1) << "for what changed before";
 
     const auto write = [&](const std::string& name, std::string_view contents) {
         std::filesystem::create_directories(directory / "app/subscriptions.d");
