@@ -90,11 +90,10 @@ FileInfo infoOf(const struct statx& status)
     return info;
 }
 
-/// Makes what was renamed in a directory outlive a power cut.
-void syncDirectory(const fs::path& directory)
+/// Synced, it keeps what was renamed in it over a power cut.
+FileHandle openDirectory(const fs::path& directory)
 {
-    FileHandle handle(open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-    if (handle) fsync(handle.fd());
+    return FileHandle(open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
 }
 
 class SystemAppendFile final : public AppendFile {
@@ -127,7 +126,8 @@ public:
                 done -= left.front().iov_len;
                 left = left.subspan(1);
             }
-            if (done > 0) left.front() = {static_cast<char*>(left.front().iov_base) + done, left.front().iov_len - done};
+            if (done > 0)
+                left.front() = {static_cast<char*>(left.front().iov_base) + done, left.front().iov_len - done};
         }
         _size += total;
         return {};
@@ -168,8 +168,8 @@ public:
         if (!file) return std::unexpected(std::move(file.error()));
         if (fchmod(file->fd(), 0600) != 0 || fsync(file->fd()) != 0) return failure(source);
         if (rename(source.c_str(), path.c_str()) == 0) {
-            syncDirectory(path.parent_path());
-            return {};
+            if (const FileHandle directory = openDirectory(path.parent_path())) fsync(directory.fd());
+            return {}; // the source is gone
         }
         if (errno != EXDEV) return failure(path);
         auto published = publish(path, [&](int fd) { return copyAll(file->fd(), fd); });
@@ -229,19 +229,25 @@ public:
         FileHandle file(retried([&] { return open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC); }));
         struct stat status {};
         if (!file || fstat(file.fd(), &status) != 0) return failure(path);
-        if (!S_ISREG(status.st_mode)) return std::unexpected(Error::posix(S_ISDIR(status.st_mode) ? EISDIR : EINVAL, path.string()));
+        if (!S_ISREG(status.st_mode))
+            return std::unexpected(Error::posix(S_ISDIR(status.st_mode) ? EISDIR : EINVAL, path.string()));
         return file;
     }
 
     Result<std::unique_ptr<AppendFile>> createForAppending(const fs::path& path) override
     {
-        FileHandle file(retried([&] {
-            return open(path.c_str(), O_RDWR | O_CREAT | O_EXCL | O_APPEND | O_NOFOLLOW | O_CLOEXEC, 0600);
-        }));
+        FileHandle file(retried(
+            [&] { return open(path.c_str(), O_RDWR | O_CREAT | O_EXCL | O_APPEND | O_NOFOLLOW | O_CLOEXEC, 0600); }));
         if (!file) return failure(path);
         return std::make_unique<SystemAppendFile>(std::move(file));
     }
 
+    Result<FileHandle> lock(const fs::path& path) override
+    {
+        FileHandle file(retried([&] { return open(path.c_str(), O_RDWR | O_CREAT | O_NOFOLLOW | O_CLOEXEC, 0600); }));
+        if (!file || flock(file.fd(), LOCK_EX | LOCK_NB) != 0) return failure(path);
+        return file;
+    }
     Result<FileHandle> createTemporary() override
     {
         FileHandle file(memfd_create("temporary", MFD_CLOEXEC));
@@ -254,14 +260,12 @@ private:
     template <class Fill> static Result<void> publish(const fs::path& path, Fill fill)
     {
         const fs::path temporary = path.string() + "." + Uuid::random().string().substr(0, 8) + ".tmp";
-        FileHandle file(retried([&] {
-            return open(temporary.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
-        }));
+        FileHandle file(retried(
+            [&] { return open(temporary.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600); }));
         if (!file) return failure(path);
-        if (fill(file.fd()) && fsync(file.fd()) == 0 && rename(temporary.c_str(), path.c_str()) == 0) {
-            syncDirectory(path.parent_path());
-            return {};
-        }
+        const FileHandle directory = openDirectory(path.parent_path());
+        if (directory && fill(file.fd()) && fsync(file.fd()) == 0 && rename(temporary.c_str(), path.c_str()) == 0)
+            return fsync(directory.fd()) == 0 ? Result<void>() : failure(path.parent_path());
         auto error = failure(path);
         unlink(temporary.c_str());
         return error;

@@ -38,13 +38,14 @@ public:
         _failed |= !_random(bytes);
         result_type number = 0;
         for (const std::uint8_t byte : bytes) number = number << 8 | byte;
-        return number;
+        return _failed ? _drawn++ : number; // nobody uses what is chosen then, but choosing must end
     }
     [[nodiscard]] bool failed() const { return _failed; }
 
 private:
     const RandomBytes& _random;
     bool _failed = false;
+    result_type _drawn = 0;
 };
 
 /// "2026-01-31", UTC. Such texts compare as the days do.
@@ -76,6 +77,8 @@ Result<void> PrivacyRecorder::record(std::string_view key, const std::set<std::s
 {
     if (texts.empty()) return {};
     if (auto made = _files.createDirectories(_directory); !made) return made;
+    const auto lock = _files.lock(_directory / "lock");
+    if (!lock) return std::unexpected(lock.error());
     auto ledger = readLedger();
     if (!ledger) return std::unexpected(std::move(ledger.error()));
     const Date now = _clock.wallNow();

@@ -37,7 +37,7 @@ inline constexpr std::int64_t kPrivacyNoRandomness = 2;
 /// in between costs the reports. Where the ledger is damaged or can't be had nothing is recorded, until someone removes
 /// it, which makes a new device of this one.
 ///
-/// One thread, and one process, at a time.
+/// One thread at a time. Of several processes one records; the others fail meanwhile (EWOULDBLOCK).
 class PrivacyRecorder {
 public:
     PrivacyRecorder(FileSystem& files, Clock& clock, std::filesystem::path directory,

@@ -127,10 +127,22 @@ TEST_F(FilesTest, AppendsWholeRecordsOrNothing)
     EXPECT_EQ(contents(directory / "records"), "head" + kilobyte + "tailb") << "the half-written record is cut off";
 }
 
+TEST_F(FilesTest, ALockIsHeldByOneHandleAtATime)
+{
+    auto held = files->lock(directory / "lock");
+    EXPECT_TRUE(held);
+    EXPECT_EQ(failure(files->lock(directory / "lock")), EWOULDBLOCK);
+    held = FileHandle();
+    EXPECT_TRUE(files->lock(directory / "lock"));
+    EXPECT_EQ(mode(directory / "lock"), 0600u);
+    EXPECT_EQ(failure(files->lock(directory / "no/lock")), ENOENT);
+}
+
 TEST_F(FilesTest, AReplacedFileIsTheOldOrTheNewAlsoAcrossFileSystems)
 {
     const test::TemporaryDirectory memory("/dev/shm");
-    struct stat here {}, there {};
+    struct stat here {
+    }, there{};
     ASSERT_EQ(stat(directory.path.c_str(), &here) | stat(memory.path.c_str(), &there), 0);
     if (here.st_dev == there.st_dev) GTEST_SKIP() << "there is one file system only";
     for (const fs::path& source : {directory / "source", memory / "source"}) {

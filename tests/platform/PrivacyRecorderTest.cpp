@@ -199,7 +199,7 @@ TEST_F(PrivacyRecorderTest, RecordsNothingWithoutASoundLedgerOrWithoutRandomness
     const auto sound = files.files;
     const auto refuses = [&](const char* why) {
         const auto before = files.files;
-        EXPECT_FALSE(record(some(1))) << why;
+        EXPECT_FALSE(record(some(5))) << why;
         EXPECT_TRUE(files.files == before) << why;
         files.files = sound;
     };
@@ -213,6 +213,8 @@ TEST_F(PrivacyRecorderTest, RecordsNothingWithoutASoundLedgerOrWithoutRandomness
         return operation == "read" && path.filename() == "ledger" ? EACCES : 0;
     };
     refuses("unreadable");
+    files.fault = [](std::string_view operation, const auto&) { return operation == "lock" ? EWOULDBLOCK : 0; };
+    refuses("another process records");
     files.fault = {};
     const RandomBytes kept = std::exchange(random, [](std::span<std::uint8_t>) { return false; });
     refuses("no randomness");

@@ -68,7 +68,8 @@ Result<FileInfo> MemoryFiles::info(const fs::path& path)
     if (const int error = faultOf("info", path)) return std::unexpected(Error::posix(error));
     if (directories.contains(path)) return FileInfo{.kind = FileInfo::Kind::Directory};
     if (!files.contains(path)) return std::unexpected(Error::posix(ENOENT));
-    return FileInfo{.size = files[path].size(), .created = created.contains(path) ? created[path] : dateFromSecondsSince1970(1767225600)};
+    return FileInfo{.size = files[path].size(),
+                    .created = created.contains(path) ? created[path] : dateFromSecondsSince1970(1767225600)};
 }
 
 Result<void> MemoryFiles::remove(const fs::path& path)
@@ -100,6 +101,12 @@ Result<FileHandle> MemoryFiles::openForReading(const fs::path& path)
     if (write(handle.fd(), contents->data(), contents->size()) < 0) return std::unexpected(Error::posix(errno));
     lseek(handle.fd(), 0, SEEK_SET);
     return handle;
+}
+
+Result<FileHandle> MemoryFiles::lock(const fs::path& path)
+{
+    if (const int error = faultOf("lock", path)) return std::unexpected(Error::posix(error));
+    return FileHandle(memfd_create("lock", MFD_CLOEXEC));
 }
 
 Result<FileHandle> MemoryFiles::createTemporary()

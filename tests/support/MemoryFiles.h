@@ -13,8 +13,7 @@ namespace platform::test {
 class MemoryFiles final : public FileSystem {
 public:
     /// Asked before every operation ("read", "write", "replace", "mkdir", "info", "remove", "list", "create", "append",
-    /// "temporary") with its path; a
-    /// number other than 0 is the errno that it fails with.
+    /// "lock", "temporary") with its path; a number other than 0 is the errno that it fails with.
     std::function<int(std::string_view operation, const std::filesystem::path& path)> fault;
 
     std::map<std::filesystem::path, std::string> files;
@@ -31,6 +30,7 @@ public:
     Result<std::vector<std::string>> list(const std::filesystem::path& path) override;
     Result<FileHandle> openForReading(const std::filesystem::path& path) override;
     Result<std::unique_ptr<AppendFile>> createForAppending(const std::filesystem::path& path) override;
+    Result<FileHandle> lock(const std::filesystem::path& path) override;
     Result<FileHandle> createTemporary() override;
 
 private:
