@@ -32,7 +32,11 @@ std::string sourceForAccuracy(double metres)
 class GeoClueLocation final : public LocationSource {
 public:
     explicit GeoClueLocation(RunLoop& runLoop) : _runLoop(runLoop) {}
-    ~GeoClueLocation() override { sd_bus_flush_close_unref(_bus); }
+    ~GeoClueLocation() override
+    {
+        sd_bus_slot_unref(_updates);
+        sd_bus_flush_close_unref(_bus);
+    }
 
     void setAllowedSources(std::set<std::string> sources) override
     {
@@ -63,29 +67,33 @@ private:
         if (sources == _allowed) return;
         _allowed = sources;
         if (_allowed.empty()) return stop("no source is allowed");
-        if (_clientPath.empty()) start();
+        // A client keeps the accuracy that it was started with, and the last place is told again to none.
+        if (!_clientPath.empty()) stop("other sources are allowed");
+        start();
     }
 
     void start()
     {
-        if (_allowed.empty() || !_clientPath.empty()) return;
+        if (_allowed.empty() || _isAsking || !_clientPath.empty()) return;
         if (!_bus) {
             if (const int failed = sd_bus_open_system(&_bus); failed < 0) return lose("no system bus", true);
             sd_bus_attach_event(_bus, _runLoop.handle(), SD_EVENT_PRIORITY_NORMAL);
         }
-        sd_bus_call_method_async(_bus, nullptr, kService, kManagerPath, "org.freedesktop.GeoClue2.Manager", "GetClient",
-                                 handler<&GeoClueLocation::gotClient>, this, "");
+        _isAsking = sd_bus_call_method_async(_bus, nullptr, kService, kManagerPath, "org.freedesktop.GeoClue2.Manager",
+                                             "GetClient", handler<&GeoClueLocation::gotClient>, this, "") >= 0;
     }
 
     int gotClient(sd_bus_message* message)
     {
         const char* path = nullptr;
+        _isAsking = false;
+        if (_allowed.empty()) return 0;
         if (sd_bus_message_is_method_error(message, nullptr) || sd_bus_message_read(message, "o", &path) < 0) {
             lose("GeoClue is not there", true);
             return 0;
         }
         _clientPath = path;
-        sd_bus_match_signal_async(_bus, nullptr, kService, path, kClientInterface, "LocationUpdated",
+        sd_bus_match_signal_async(_bus, &_updates, kService, path, kClientInterface, "LocationUpdated",
                                   handler<&GeoClueLocation::locationUpdated>, nullptr, this);
         setClientProperty("DesktopId", "s", kDesktopId);
         const std::uint32_t accuracy = _allowed.contains("gps")    ? kAccuracyExact
@@ -107,6 +115,7 @@ private:
     {
         if (const sd_bus_error* error = sd_bus_message_get_error(message)) {
             _clientPath.clear();
+            _updates = sd_bus_slot_unref(_updates);
             lose(error->message ? error->message : "GeoClue refused", true);
         }
         return 0;
@@ -159,6 +168,7 @@ private:
 
     void stop(const char* reason)
     {
+        _updates = sd_bus_slot_unref(_updates);
         if (!_clientPath.empty()) {
             sd_bus_call_method_async(_bus, nullptr, kService, _clientPath.c_str(), kClientInterface, "Stop", nullptr,
                                      nullptr, "");
@@ -199,7 +209,9 @@ private:
     static constexpr int kMaximumRestarts = 3;
 
     RunLoop& _runLoop;
-    sd_bus* _bus = nullptr; // loop's thread, like the next two
+    sd_bus* _bus = nullptr; // loop's thread, like the next four
+    sd_bus_slot* _updates = nullptr;
+    bool _isAsking = false; // for a client
     std::set<std::string> _allowed;
     std::string _clientPath;
     std::mutex _mutex;

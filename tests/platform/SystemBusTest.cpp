@@ -9,6 +9,7 @@
 #include <systemd/sd-bus.h>
 
 #include "platform/DeviceUse.h"
+#include "platform/LocationSource.h"
 #include "platform/NetworkStatus.h"
 #include "platform/RunLoop.h"
 #include "tests/support/TemporaryDirectory.h"
@@ -150,6 +151,126 @@ TEST_F(SystemBusTest, LogindSaysWhetherSomeoneIsAtTheScreen)
     }
     sd_bus_slot_unref(slot);
     EXPECT_EQ(ask(), DeviceUse()) << "logged out, but has been there";
+}
+
+/// A GeoClue with one client, which is at one place until it is moved.
+struct GeoClue {
+    double latitude = 47.37, longitude = 8.54, accuracy = 20;
+    std::uint32_t wanted = 0; // the accuracy level of the client
+    std::string desktopId;
+    int started = 0, stopped = 0;
+
+    void fix(sd_bus* bus) const
+    {
+        sd_bus_emit_signal(bus, "/client", "org.freedesktop.GeoClue2.Client", "LocationUpdated", "oo", "/", "/place");
+    }
+};
+GeoClue& geoClue(void* data)
+{
+    return *static_cast<GeoClue*>(data);
+}
+int setText(sd_bus*, const char*, const char*, const char*, sd_bus_message* value, void* text, sd_bus_error*)
+{
+    const char* read = nullptr;
+    const int result = sd_bus_message_read(value, "s", &read);
+    if (result > 0) *static_cast<std::string*>(text) = read;
+    return result;
+}
+int getText(sd_bus*, const char*, const char*, const char*, sd_bus_message* reply, void* text, sd_bus_error*)
+{
+    return sd_bus_message_append(reply, "s", static_cast<std::string*>(text)->c_str());
+}
+const sd_bus_vtable kGeoClueManager[]{
+    SD_BUS_VTABLE_START(0),
+    SD_BUS_METHOD(
+        "GetClient", "", "o",
+        +[](sd_bus_message* call, void*, sd_bus_error*) { return sd_bus_reply_method_return(call, "o", "/client"); },
+        SD_BUS_VTABLE_UNPRIVILEGED),
+    SD_BUS_VTABLE_END,
+};
+const sd_bus_vtable kGeoClueClient[]{
+    SD_BUS_VTABLE_START(0),
+    SD_BUS_WRITABLE_PROPERTY("DesktopId", "s", getText, setText, offsetof(GeoClue, desktopId),
+                             SD_BUS_VTABLE_UNPRIVILEGED),
+    SD_BUS_WRITABLE_PROPERTY("RequestedAccuracyLevel", "u", nullptr, nullptr, offsetof(GeoClue, wanted),
+                             SD_BUS_VTABLE_UNPRIVILEGED),
+    SD_BUS_METHOD(
+        "Start", "", "",
+        +[](sd_bus_message* call, void* data, sd_bus_error*) {
+            ++geoClue(data).started;
+            sd_bus_reply_method_return(call, "");
+            geoClue(data).fix(sd_bus_message_get_bus(call));
+            return 1;
+        },
+        SD_BUS_VTABLE_UNPRIVILEGED),
+    SD_BUS_METHOD(
+        "Stop", "", "",
+        +[](sd_bus_message* call, void* data, sd_bus_error*) {
+            ++geoClue(data).stopped;
+            return sd_bus_reply_method_return(call, "");
+        },
+        SD_BUS_VTABLE_UNPRIVILEGED),
+    SD_BUS_SIGNAL("LocationUpdated", "oo", 0),
+    SD_BUS_VTABLE_END,
+};
+const sd_bus_vtable kGeoCluePlace[]{
+    SD_BUS_VTABLE_START(0),
+    SD_BUS_PROPERTY("Latitude", "d", nullptr, offsetof(GeoClue, latitude), 0),
+    SD_BUS_PROPERTY("Longitude", "d", nullptr, offsetof(GeoClue, longitude), 0),
+    SD_BUS_PROPERTY("Accuracy", "d", nullptr, offsetof(GeoClue, accuracy), 0),
+    SD_BUS_VTABLE_END,
+};
+
+TEST_F(SystemBusTest, GeoClueIsAskedAsExactlyAsIsAllowedAndAnewWhereThatChanges)
+{
+    GeoClue geo;
+    serve("org.freedesktop.GeoClue2");
+    sd_bus_add_object_vtable(service, nullptr, "/org/freedesktop/GeoClue2/Manager", "org.freedesktop.GeoClue2.Manager",
+                             kGeoClueManager, &geo);
+    sd_bus_add_object_vtable(service, nullptr, "/client", "org.freedesktop.GeoClue2.Client", kGeoClueClient, &geo);
+    sd_bus_add_object_vtable(service, nullptr, "/place", "org.freedesktop.GeoClue2.Location", kGeoCluePlace, &geo);
+    const auto location = makeGeoClueLocationSource(loop);
+    std::vector<std::string> told;
+    location->onChange(
+        [&](const auto& place, const std::string& reason) { told.push_back(place ? place->source : reason); });
+    const auto becomes = [&](const std::optional<Location>& place) {
+        return test::runUntil(loop, [&] { return location->current() == place; });
+    };
+    const struct {
+        std::set<std::string> allowed;
+        double accuracy;
+        std::uint32_t level;
+        std::string source;
+    } cases[]{
+        {{"cell"}, 5000, 4, "cell"}, {{"gps"}, 20, 8, "gps"},         {{"wifi", "cell"}, 300, 6, "wifi"},
+        {{"gps"}, 20, 8, "gps"},     {{"gps", "cell"}, 20, 8, "gps"},
+    };
+    int started = 0;
+    for (const auto& c : cases) {
+        geo.accuracy = c.accuracy;
+        location->setAllowedSources(c.allowed);
+        EXPECT_TRUE(test::runUntil(loop, [&] { return geo.started == started + 1; }));
+        EXPECT_TRUE(becomes(fuzz(geo.latitude, geo.longitude, c.source))) << c.source;
+        EXPECT_EQ(geo.wanted, c.level);
+        EXPECT_EQ(geo.stopped, started++) << "the one before";
+    }
+    EXPECT_EQ(geo.desktopId, "com.quorvane.tavrind");
+    geo.accuracy = 300;
+    geo.fix(service);
+    EXPECT_TRUE(becomes(std::nullopt));
+    EXPECT_EQ(told.back(), "its source is not allowed");
+    geo = {.latitude = -33.9, .longitude = 18.4, .started = geo.started};
+    geo.fix(service);
+    EXPECT_TRUE(becomes(fuzz(-33.9, 18.4, "gps")));
+    location->setAllowedSources({});
+    EXPECT_TRUE(becomes(std::nullopt));
+    location->setAllowedSources({"gps"});
+    location->setAllowedSources({}); // while a client is asked for
+    EXPECT_TRUE(test::runUntil(loop, [&] { return geo.stopped == 1; }));
+    geo.fix(service);
+    loop.runOnce(Duration::zero());
+    EXPECT_EQ(geo.started, started);
+    EXPECT_EQ(location->current(), std::nullopt);
 }
 
 } // namespace
