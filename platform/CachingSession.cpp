@@ -134,7 +134,7 @@ private:
         _requested = _cache->now();
         {
             std::lock_guard lock(_mutex);
-            if (_state == State::Ended) return;
+            if (_state == State::Ended || _cancelled) return; // who cancelled it ends it
             _state = State::Loading;
             if (other) _load = std::move(other);
             _self = shared_from_this();
@@ -156,7 +156,10 @@ private:
             if (_confirming && response->statusCode == 304) {
                 if (!direct || !confirms(*response, *_stored)) return loadUnconditionally();
                 const StoredResponse stored = confirmed(*_stored, *response, _requested, _cache->now());
-                _cache->store(_request.url, stored);
+                if (isStorable(_request, stored.response, stored.received))
+                    _cache->store(_request.url, stored);
+                else
+                    _cache->remove(_request.url);
                 data = stored.body;
                 response = stored.response;
             } else {
@@ -274,7 +277,12 @@ private:
     [[nodiscard]] DataCompletion invalidating(const Url& url, DataCompletion completion) const
     {
         return [cache = _cache, url, completion = std::move(completion)](auto data, auto response, auto error) mutable {
-            if (!error && response && response->statusCode >= 200 && response->statusCode < 400) cache->remove(url);
+            if (!error && response) {
+                const bool redirected = cacheKey(response->url) != cacheKey(url);
+                const bool done = response->statusCode >= 200 && response->statusCode < 400;
+                if (done || redirected) cache->remove(url);
+                if (done && redirected) cache->remove(response->url);
+            }
             completion(std::move(data), std::move(response), std::move(error));
         };
     }

@@ -154,7 +154,8 @@ private:
     long _markedHop = 0;
     TransferMarks _marks;       // by the end of that hop
     TransferMarks _earlierHops; // by the end of the one before
-    std::optional<bool> _firstHopPublic;
+    bool _headersEnded = false; // of this hop; what comes behind its body is no header field
+    bool _wasPublic = false;    // one of the hops
     bool _forbiddenHop = false;
     std::array<char, CURL_ERROR_SIZE> _errorText{};
 
@@ -234,11 +235,13 @@ std::size_t CurlTask::receivedHeader(std::string_view line)
     if (line.starts_with("HTTP/")) {
         noteMarks();
         _headers = {}; // of a redirect, or of an interim answer
+        _headersEnded = false;
         forgetBody();
         return line.size();
     }
+    if (line == "\r\n" || line == "\n") _headersEnded = true;
     const std::size_t colon = line.find(':');
-    if (colon == std::string_view::npos) return line.size();
+    if (colon == std::string_view::npos || _headersEnded) return line.size();
     std::string_view value = line.substr(colon + 1);
     const auto isBlank = [](char c) { return c == ' ' || c == '\t' || c == '\r' || c == '\n'; };
     while (!value.empty() && isBlank(value.front())) value.remove_prefix(1);
@@ -273,13 +276,13 @@ Error CurlTask::unsupported() const
     return urlError(kUrlBadResponse, fmt::format("the answer isn't HTTP: {}", _errorText.data()));
 }
 
-/// A public host must not lead us, by a redirect, to an address of the inner network.
+/// A public host must not lead us, by redirects, to an address of the inner network.
 int CurlTask::mayConnect(const char* address)
 {
     _sentHop = hop();
     const bool isPublic = isPublicAddress(address);
-    if (!_firstHopPublic) _firstHopPublic = isPublic;
-    _forbiddenHop = *_firstHopPublic && !isPublic;
+    _forbiddenHop = _wasPublic && !isPublic;
+    _wasPublic = _wasPublic || isPublic;
     return _forbiddenHop ? CURL_PREREQFUNC_ABORT : CURL_PREREQFUNC_OK;
 }
 
@@ -407,9 +410,9 @@ void CurlTask::complete(CURLcode code, bool cancelled)
 
     if (_easy && !cancelled) {
         long status = 0;
-        char* url = nullptr;
+        char* url = nullptr; // which libcurl may have written otherwise than we did
         curl_easy_getinfo(_easy, CURLINFO_RESPONSE_CODE, &status);
-        curl_easy_getinfo(_easy, CURLINFO_EFFECTIVE_URL, &url);
+        if (hop() > 0) curl_easy_getinfo(_easy, CURLINFO_EFFECTIVE_URL, &url);
         if (status > 0) {
             response = UrlResponse{.url = url ? Url::parse(url).value_or(_request.url) : _request.url,
                                    .isHttp = true,

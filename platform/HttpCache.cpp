@@ -121,7 +121,7 @@ struct HttpCache::Impl : std::enable_shared_from_this<Impl> {
         memory.put(key, shared);
         if (!hasDisk()) return;
         const std::size_t size = sizeOf(key, *shared);
-        if (shared->body.size() >= configuration.diskCapacity / kLargestPart || waitingBytes + size > kMostWaiting)
+        if (shared->body.size() > configuration.diskCapacity / kLargestPart || waitingBytes + size > kMostWaiting)
             return removeBehind(std::move(key));
         change(hash(key), size, [self = shared_from_this(), key, shared] { self->writeToDisk(key, *shared); });
     }
@@ -255,6 +255,10 @@ private:
             HttpCacheStore::open(configuration.directory, {.capacity = configuration.diskCapacity,
                                                            .minimumMappedSize = configuration.minimumMappedSize});
         auto keys = opened ? (*opened)->keys() : std::unexpected(opened.error());
+        if (opened && !keys && HttpCacheStore::isDamage(keys.error())) {
+            logFailure(keys.error());
+            if ((*opened)->beginAnew()) keys = (*opened)->keys();
+        }
         if (!keys) {
             logFailure(keys.error());
             closeStore();

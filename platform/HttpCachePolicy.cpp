@@ -208,6 +208,7 @@ seconds currentAge(const StoredResponse& stored, Date now)
 Reuse reuse(const StoredResponse& stored, const UrlRequest& request, Date now)
 {
     if (selectingFields(stored.response, request) != stored.selecting) return Reuse::None;
+    if (directivesOf(stored.response.headers).noStore) return Reuse::None; // it is here for who stored it
     const Directives asked = requestDirectives(request.headers);
     const seconds age = currentAge(stored, now);
     const bool fresh = !asked.noCache && age < freshnessLifetime(stored.response, stored.received) &&

@@ -177,6 +177,12 @@ TEST_F(CachingSessionTest, StaleAnswersAreConfirmed)
     sent().at(0)->fail(Error("x", 1));
     executor.drain();
     EXPECT_EQ(failing->wait().code(), 1);
+
+    (void)answer(*start(), 200, "four", kFresh);
+    clock.advance(60s, [] {});
+    auto last = start();
+    EXPECT_EQ(answer(*last, 304, "", {{"Cache-Control", "no-store, max-age=60"}}).body(), "four");
+    EXPECT_FALSE(cache->find(kUrl)) << "from now on it may not be kept";
 }
 
 TEST_F(CachingSessionTest, WhatMustNotBeAnsweredIsLoadedAndWhatMustNotBeKeptIsNot)
@@ -199,7 +205,10 @@ TEST_F(CachingSessionTest, WhatMustNotBeAnsweredIsLoadedAndWhatMustNotBeKeptIsNo
     EXPECT_EQ(answer(*start({.url = kUrl, .method = "POST"}), 204, "", kFresh).body(), "");
     EXPECT_FALSE(cache->find(kUrl));
 
-    EXPECT_EQ(answer(*start(), 503, "", kFresh).status(), 503);
+    cache->store(kUrl, {.url = kUrl, .statusCode = 200, .headers = {{"Cache-Control", "no-store, max-age=60"}}},
+                 Bytes(std::string("x")));
+    EXPECT_EQ(answer(*start(), 503, "", kFresh).status(), 503) << "it is for who looks for it, not for requests";
+    cache->remove(kUrl);
     EXPECT_FALSE(cache->find(kUrl));
     for (int i = 0; i < 2; ++i) EXPECT_EQ(answer(*start(), 200, "no word of freshness").body(), "no word of freshness");
     EXPECT_FALSE(cache->find(kUrl));

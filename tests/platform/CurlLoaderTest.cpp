@@ -76,6 +76,12 @@ TEST_F(CurlLoaderTest, HeaderFieldsAreTrimmedAndKeepTheirOrder)
     for (const auto& [name, value] : outcome.response->headers) fields += name + "=" + value + "\n";
     EXPECT_EQ(fields, "X-A=one\nx-a=two\nEmpty=\nETag=\"a:b\"\nContent-Length=0\n");
     EXPECT_EQ(outcome.response->headers.find("x-A"), &outcome.response->headers.begin()->second);
+
+    TestHttpServer trailing(always({"HTTP/1.1 200 OK\r\nTransfer-Encoding: chunked\r\nTrailer: Cache-Control\r\n\r\n"
+                                    "1\r\na\r\n0\r\nCache-Control: max-age=1000\r\n\r\n"}));
+    const Outcome trailed = load(trailing.url());
+    EXPECT_EQ(trailed.body(), "a");
+    EXPECT_FALSE(trailed.response->headers.find("Cache-Control")) << "what comes behind the body";
 }
 
 TEST_F(CurlLoaderTest, RequestsGoOutAsAsked)
