@@ -10,7 +10,9 @@ namespace tavrin::ctl {
 namespace {
 
 using Action = LineEditor::Action;
+using testing::AllOf;
 using testing::HasSubstr;
+using testing::Not;
 
 TEST(Characters, CountWhatATerminalShows)
 {
@@ -140,6 +142,8 @@ TEST(SearchScreen, ShowsTheNewestKeysAndAsMuchOfTheAnswerAsFits)
     const std::string bytes = drawn(layOut(fullView(), {80, 24}), false);
     EXPECT_EQ(bytes.find('\n'), std::string::npos) << "a line end at the bottom scrolls";
     EXPECT_THAT(bytes, HasSubstr("\033[1;16H"));
+    EXPECT_THAT(bytes, AllOf(HasSubstr("\033[24;1H\033[K"), Not(HasSubstr("\033[J"))))
+        << "clearing behind a full line takes its last character";
 }
 
 TEST(SearchScreen, MarksWhereAnswersCameFrom)

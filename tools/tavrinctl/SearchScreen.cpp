@@ -116,11 +116,11 @@ std::string drawn(const ScreenFrame& frame, bool colours)
     for (std::size_t row = 0; row < frame.lines.size(); ++row) {
         const ScreenLine& line = frame.lines[row];
         const char* style = line.style == Style::Bold ? "\033[1m" : line.style == Style::Dim ? "\033[2m" : "";
-        bytes += fmt::format("\033[{};1H", row + 1);
+        // Cleared first: behind a full line the cursor is still on its last character.
+        bytes += fmt::format("\033[{};1H\033[K", row + 1);
         bytes += colours && *style ? style + line.text + "\033[0m" : line.text;
-        bytes += "\033[K";
     }
-    return bytes + fmt::format("\033[J\033[1;{}H\033[?25h", frame.cursorColumn + 1);
+    return bytes + fmt::format("\033[1;{}H\033[?25h", frame.cursorColumn + 1);
 }
 
 std::vector<ScreenLine> answerLines(const Exchange& exchange)

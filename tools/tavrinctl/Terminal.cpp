@@ -6,6 +6,7 @@
 #include <sys/ioctl.h>
 #include <sys/signalfd.h>
 #include <unistd.h>
+#include <utility>
 
 #include "tools/tavrinctl/Tool.h"
 
@@ -16,6 +17,9 @@ namespace {
 // The other screen, and no wrapping of long lines.
 constexpr const char* kEnter = "\033[?1049h\033[?7l\033[H\033[2J";
 constexpr const char* kLeave = "\033[0m\033[?25h\033[?7h\033[?1049l";
+
+/// Signals that ask the program to end.
+constexpr int kEnding[]{SIGINT, SIGTERM, SIGHUP, SIGQUIT};
 
 void watch(int epoll, int descriptor)
 {
@@ -30,7 +34,8 @@ Terminal::Terminal()
     if (isatty(STDIN_FILENO) != 1 || isatty(STDOUT_FILENO) != 1 || tcgetattr(STDIN_FILENO, &_original) != 0)
         throw Failure("--interactive needs a terminal; for scripts there is --typed", 2);
     sigemptyset(&_signals);
-    for (const int signal : {SIGINT, SIGTERM, SIGHUP, SIGQUIT, SIGWINCH}) sigaddset(&_signals, signal);
+    sigaddset(&_signals, SIGWINCH);
+    for (const int signal : kEnding) sigaddset(&_signals, signal);
     _signalInput = signalfd(-1, &_signals, SFD_CLOEXEC | SFD_NONBLOCK);
     _input = epoll_create1(EPOLL_CLOEXEC);
     watch(_input, STDIN_FILENO);
@@ -55,10 +60,12 @@ void Terminal::enter()
     raw.c_cc[VTIME] = 0;
     tcsetattr(STDIN_FILENO, TCSADRAIN, &raw);
     show(kEnter);
+    _entered = true;
 }
 
 void Terminal::leave()
 {
+    if (!std::exchange(_entered, false)) return;
     show(kLeave);
     tcsetattr(STDIN_FILENO, TCSAFLUSH, &_original); // keys that nobody read are not for the shell
 }
@@ -72,13 +79,17 @@ Terminal::Input Terminal::read()
         if (ready[i].data.fd == STDIN_FILENO) {
             char keys[4096];
             const ssize_t length = ::read(STDIN_FILENO, keys, sizeof(keys));
-            if (length > 0) input.keys.assign(keys, static_cast<std::size_t>(length));
-            else if (length == 0 || errno != EINTR) input.ended = true;
+            if (length > 0)
+                input.keys.assign(keys, static_cast<std::size_t>(length));
+            else if (length == 0 || errno != EINTR)
+                input.ended = true;
         } else {
             signalfd_siginfo signal{};
             while (::read(_signalInput, &signal, sizeof(signal)) == sizeof(signal)) {
-                if (signal.ssi_signo == SIGWINCH) input.resized = true;
-                else input.signal = static_cast<int>(signal.ssi_signo);
+                if (signal.ssi_signo == SIGWINCH)
+                    input.resized = true;
+                else
+                    input.signal = static_cast<int>(signal.ssi_signo);
             }
         }
     }
@@ -96,8 +107,10 @@ void Terminal::show(const std::string& bytes)
 {
     for (std::size_t done = 0; done < bytes.size();) {
         const ssize_t written = write(STDOUT_FILENO, bytes.data() + done, bytes.size() - done);
-        if (written > 0) done += static_cast<std::size_t>(written);
-        else if (errno != EINTR) return; // a terminal that is gone shows nothing
+        if (written > 0)
+            done += static_cast<std::size_t>(written);
+        else if (errno != EINTR)
+            return; // a terminal that is gone shows nothing
     }
 }
 
@@ -105,6 +118,10 @@ void Terminal::suspend()
 {
     leave();
     raise(SIGSTOP);
+    sigset_t pending;
+    sigpending(&pending);
+    for (const int signal : kEnding)
+        if (sigismember(&pending, signal) == 1) return; // in the background the terminal would stop us again
     enter();
 }
 

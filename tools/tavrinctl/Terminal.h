@@ -31,7 +31,8 @@ public:
 
     [[nodiscard]] ScreenSize size() const;
     void show(const std::string& bytes);
-    /// Gives the terminal back and stops the program, as Ctrl-Z does; returns when it is continued.
+    /// Gives the terminal back and stops the program, as Ctrl-Z does; returns when it is continued. Where it
+    /// was to end meanwhile the terminal stays as it is.
     void suspend();
 
 private:
@@ -39,6 +40,7 @@ private:
     void leave();
 
     termios _original{};
+    bool _entered = false;
     sigset_t _signals{};
     sigset_t _originalSignals{};
     int _signalInput = -1;
