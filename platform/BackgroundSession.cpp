@@ -25,7 +25,7 @@ namespace fs = std::filesystem;
 
 namespace {
 
-constexpr std::size_t kMaximumNote = 4096;
+constexpr std::size_t kMaximumNote = 128u << 10; // any URL
 /// Bytes of a request's URL, header fields and own body.
 constexpr std::size_t kMaximumRequest = 256u << 10;
 constexpr Duration kLongestHold = std::chrono::hours(24);

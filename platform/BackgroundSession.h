@@ -21,7 +21,7 @@ class Queue;
 /// `setNote` write to disk.
 class BackgroundTask : public UrlTask {
 public:
-    /// What the owner wants to remember of the task, kept with it: a small JSON value, 4 KiB of text at most (a larger
+    /// What the owner wants to remember of the task, kept with it: a small JSON value, 128 KiB of text at most (a larger
     /// one is logged and left out).
     virtual void setNote(Value note) = 0;
     [[nodiscard]] virtual Value note() const = 0;

@@ -23,6 +23,8 @@ namespace {
 
 constexpr std::size_t kMaximumApplications = 10'000;
 constexpr int kMaximumDepth = 4;
+/// Folders: each takes one of the inotify instances of which a user has, by default, 128.
+constexpr std::size_t kMaximumWatches = 32;
 constexpr std::size_t kMaximumEntrySize = 1u << 20;
 constexpr std::size_t kMaximumMetadataSize = 4u << 20;
 constexpr Duration kSettleTime = std::chrono::seconds(2);
@@ -176,6 +178,10 @@ private:
             std::vector<fs::path> folders = EntryFolder(directory / "applications").folders;
             if (folders.empty()) folders.push_back(directory / "applications");
             for (const fs::path& folder : folders) {
+                if (watches.size() == kMaximumWatches) {
+                    defaultLog().error("of the folders of applications {} are watched", kMaximumWatches);
+                    break;
+                }
                 auto known = _watches.extract(folder);
                 watches[folder] = known ? std::move(known.mapped())
                                         : std::make_unique<FileWatch>(_runLoop, folder / "", [this] { changed(); });

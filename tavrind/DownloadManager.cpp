@@ -23,7 +23,6 @@ namespace fs = std::filesystem;
 
 namespace {
 
-using namespace std::chrono_literals;
 
 constexpr const char* kTableKey = "download_resources";
 constexpr const char* kIdentifierHeader = "X-Quorvane-Download-Identifier";
@@ -31,7 +30,6 @@ constexpr const char* kDirectory = "com.quorvane.tavrind";
 constexpr const char* kDelayKey = "TAVDownloadDelay"; // for development
 constexpr std::int64_t kDelay = 60;                   // seconds
 constexpr std::int64_t kLongestDelay = 24 * 60 * 60;
-constexpr platform::Duration kTaskListTimeout = 5s;
 
 const platform::Log& log()
 {
@@ -55,12 +53,6 @@ void logTaskError(const std::string& reason)
 {
     log().error("download task error {}", makeTAVError(TAVErrorInvalidResponse, reason).description());
 }
-
-/// The list of a session's tasks, on its way.
-struct TaskList {
-    platform::Event arrived;
-    std::vector<std::shared_ptr<platform::BackgroundTask>> tasks; // once it has
-};
 
 } // namespace
 
@@ -152,10 +144,12 @@ void DownloadManager::_handleSignificantLocationChange()
 
 void DownloadManager::_start()
 {
-    if (_started.exchange(true)) return;
-    log().log("started");
-    _queue->async([weak = weak_from_this()] {
-        if (const auto self = weak.lock()) self->_loadResources();
+    // Whoever comes second finds the loading queued ahead of what it queues itself.
+    std::call_once(_started, [this] {
+        log().log("started");
+        _queue->async([weak = weak_from_this()] {
+            if (const auto self = weak.lock()) self->_loadResources();
+        });
     });
 }
 
@@ -173,29 +167,31 @@ void DownloadManager::_saveResources()
 void DownloadManager::_downloadBagResources(const std::shared_ptr<const TAVBag>& bag)
 {
     _queue->assertOnQueue();
-    const auto list = std::make_shared<TaskList>();
-    _assembly.downloadURLSession->getTasks([list](auto tasks) {
-        list->tasks = std::move(tasks);
-        list->arrived.signal();
+    _latestBag = bag;
+    // The queue goes on meanwhile: who waits in `sync` for a version holds a worker that the list may need.
+    _assembly.downloadURLSession->getTasks([weak = weak_from_this(), queue = _queue, bag](auto tasks) {
+        queue->async([weak, bag, tasks = std::move(tasks)] {
+            const auto self = weak.lock();
+            if (self && self->_latestBag == bag) self->_replaceDownloads(tasks, *bag);
+        });
     });
-    _queue->suspendUntil(list->arrived, kTaskListTimeout, [weak = weak_from_this(), list, bag] {
-        const auto self = weak.lock();
-        if (!self) return;
-        if (list->arrived.signalled()) {
-            for (const auto& task : list->tasks) {
-                log().log("canceling {}", task->originalRequest().url.string());
-                task->cancel();
-            }
-        }
-        for (const std::string_view key : kTAVResourceIdentifiers) {
-            const std::string identifier(key);
-            if (self->_isAllowed(identifier))
-                self->_addResource(identifier, bag->resourceURL(identifier));
-            else
-                log().log("{} is disabled, not downloading", identifier);
-        }
-        self->_saveResources();
-    });
+}
+
+void DownloadManager::_replaceDownloads(const std::vector<std::shared_ptr<platform::BackgroundTask>>& tasks,
+                                        const TAVBag& bag)
+{
+    for (const auto& task : tasks) {
+        log().log("canceling {}", task->originalRequest().url.string());
+        task->cancel();
+    }
+    for (const std::string_view key : kTAVResourceIdentifiers) {
+        const std::string identifier(key);
+        if (_isAllowed(identifier))
+            _addResource(identifier, bag.resourceURL(identifier));
+        else
+            log().log("{} is disabled, not downloading", identifier);
+    }
+    _saveResources();
 }
 
 void DownloadManager::_addResource(const std::string& identifier, const std::optional<Url>& url)
@@ -346,7 +342,10 @@ void DownloadManager::_noteReceived(const std::string& identifier, const Value& 
     }
     DownloadResource& resource = found->second;
     resource.url = note.asString() ? Url::parse(*note.asString()) : std::nullopt;
-    resource.redirectUrl = response.url == request.url ? std::nullopt : std::optional(response.url);
+    if (response.url != request.url)
+        resource.redirectUrl = response.url;
+    else if (response.statusCode == 200)
+        resource.redirectUrl.reset(); // but the copy that a 304 keeps is from where it was
     log().log("{} url: {}", identifier, response.url.string());
     _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.resourcefilesfetched");
     _saveResources();

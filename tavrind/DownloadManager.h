@@ -1,9 +1,9 @@
 #pragma once
 
-#include <atomic>
 #include <filesystem>
 #include <map>
 #include <memory>
+#include <mutex>
 #include <optional>
 #include <string>
 
@@ -86,6 +86,7 @@ private:
     void _loadResources();
     void _saveResources();
     void _downloadBagResources(const std::shared_ptr<const TAVBag>& bag);
+    void _replaceDownloads(const std::vector<std::shared_ptr<platform::BackgroundTask>>& tasks, const TAVBag& bag);
     void _addResource(const std::string& identifier, const std::optional<platform::Url>& url);
     void _deleteResource(const std::string& identifier, File file);
     void _removeFile(const std::string& identifier) const;
@@ -108,7 +109,8 @@ private:
     /// that one that was called off doesn't begin the next.
     std::map<std::string, std::shared_ptr<platform::Url>> _pending;
     std::weak_ptr<LookupResources> _lookupResources;
-    std::atomic<bool> _started = false;
+    std::shared_ptr<const TAVBag> _latestBag; // whose downloads take the place of all others
+    std::once_flag _started;
     platform::NotificationCenter::Token _bagObserver;
     platform::NotificationCenter::Token _locationObserver;
 };
