@@ -4,8 +4,8 @@
 #include <optional>
 #include <string_view>
 
-/// The words by which ranking features, kinds of client, engagement functions and result placements are named, and which
-/// client a user agent or an identifier belongs to. Pure functions.
+/// The words by which ranking features, kinds of client, engagement functions and result placements are named, and
+/// which client a user agent or an identifier belongs to. Pure functions.
 ///
 /// The two directions of a pair are not exact inverses, and some names are misspelled: both are relied on by the
 /// service and stay as they are. A missing string reads as the unknown kind.
@@ -36,7 +36,7 @@ using OptionalText = std::optional<std::string_view>;
 /// case; first in that order, not in the text.
 [[nodiscard]] std::optional<std::string_view> extractClientNameFromString(OptionalText text);
 
-/// True if `text` contains `part`, without regard to the case of ASCII letters.
+/// True if `text` contains `part`, in any case.
 [[nodiscard]] bool tavrin_caseInsensitiveContainsString(std::string_view text, std::string_view part);
 
 } // namespace tavrin

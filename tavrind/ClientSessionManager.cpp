@@ -96,7 +96,7 @@ void ClientSessionManager::addTavrinFeedback(std::shared_ptr<TavrinFeedback> fee
 
 bool ClientSessionManager::_wantsFeedback(const TavrinFeedback& feedback) const
 {
-    const auto bag = _assembly.bagController ? _assembly.bagController->inMemoryBag() : nullptr;
+    const auto bag = _assembly.bagController ? _assembly.bagController->currentBag() : nullptr;
     return !bag || TAVBag(bag->rawBag(), feedback.userAgent).feedbackEnabled();
 }
 

@@ -149,7 +149,7 @@ Value ClientStateManager::_cachedImages(const Value::Array& images, const TAVBag
         if (const auto data = _cachedImage(url ? Url::parse(*url) : std::nullopt); !data.empty()) {
             log().log("mapping image url {} to {} bytes of data", *url, data.size());
             map(*url, data);
-        } else if (identifier) {
+        } else if (identifier && !loaded.contains(*identifier)) {
             const auto other = _cachedImage(bag.urlForIdentifier(*identifier));
             if (other.empty()) continue;
             log().log("mapping image id {} to {} bytes of data", *identifier, other.size());

@@ -117,8 +117,10 @@ void ClientState::_withBag(ExchangePtr exchange, std::move_only_function<void()>
             self->_queue->sync([&] { return std::pair(self->_bag, self->_userAgent); });
         if (!ensured || !exchange->bag) {
             if (exchange->isSearch)
-                exchange->log().error("Bag fetch failed, can't complete non-cached query {}.", exchange->request->queryString);
-            else exchange->log().error("Bag fetch failed, can't complete non-cached {}.", exchange->what);
+                exchange->log().error("Bag fetch failed, can't complete non-cached query {}.",
+                                      exchange->request->queryString);
+            else
+                exchange->log().error("Bag fetch failed, can't complete non-cached {}.", exchange->what);
             exchange->answer(nullptr, makeTAVError(TAVErrorTimeout, "timeout"));
             return self->_skipSearch(*exchange, kBagFetchFailed);
         }
@@ -187,8 +189,8 @@ void ClientState::moreResults(std::shared_ptr<TAVMoreResultsRequest> request, Re
         exchange->fieldMask = kFieldMaskNoLocation;
     exchange->retryable = true;
     _send(exchange,
-          _assembly.requestFactory->moreResultsRequest(*request, exchange->bag.get(), _currentUserGUID(),
-                                                       exchange->fieldMask, _requestTimeout()),
+          _assembly.requestFactory->moreResultsRequest(*request, exchange->bag.get(), exchange->userAgent,
+                                                       _currentUserGUID(), exchange->fieldMask, _requestTimeout()),
           request->moreResultsURL ? request->moreResultsURL->queryValue("q").value_or("") : "");
 }
 
@@ -220,8 +222,8 @@ void ClientState::lookup(std::shared_ptr<TAVLookupRequest> request, RequestReply
             exchange->answer(nullptr, {});
             return self->_skipSearch(*exchange, kBagDisabled);
         }
-        auto httpRequest = self->_assembly.requestFactory->lookupRequest(*request, *exchange->bag, self->_currentUserGUID(),
-                                                                         self->_requestTimeout());
+        auto httpRequest = self->_assembly.requestFactory->lookupRequest(
+            *request, *exchange->bag, self->_currentUserGUID(), self->_requestTimeout());
         exchange->retryable = true;
         const auto timeout = httpRequest ? httpRequest->timeout : std::nullopt;
         exchange->expire = self->_assembly.device.clock.wallNow() + timeout.value_or(std::chrono::seconds(60));

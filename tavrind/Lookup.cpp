@@ -134,14 +134,15 @@ void Lookup::filterLookupResultsWithRequest(const TAVLookupRequest& request, Val
                            shortened(response));
     LookupContext context(request.queryContext.value_or(""), locale);
     for (Value& resultSet : response.mutableArray()) {
-        const Value::Array* results = resultSet["results"].asArray();
-        if (!results) continue;
+        if (!resultSet.asDictionary()) continue;
         Value::Array kept;
-        kept.reserve(results->size());
-        std::ranges::copy_if(*results, std::back_inserter(kept), [&](const Value& result) {
-            const Value& instructions = result["lookup_instructions"];
-            return !instructions.asDictionary() || context.keeps(instructions);
-        });
+        if (const Value::Array* results = resultSet["results"].asArray()) {
+            kept.reserve(results->size());
+            std::ranges::copy_if(*results, std::back_inserter(kept), [&](const Value& result) {
+                const Value& instructions = result["lookup_instructions"];
+                return !instructions.asDictionary() || context.keeps(instructions);
+            });
+        }
         resultSet.mutableDictionary().set("results", std::move(kept));
     }
 }
@@ -255,7 +256,9 @@ void Lookup::_pushDDSourceFile(const FileHandle* file, SourceKind kind, const st
 {
     _queue->assertOnQueue();
     const auto pushed = _assembly.device.dataDetectors.setSource(kind, file, version);
-    if (!pushed) log().error("failed to push data to data detectors: {}", pushed.error().description());
+    if (pushed) return;
+    log().error("failed to push data to data detectors");
+    log().error("data detectors: {}", pushed.error().description());
 }
 
 } // namespace tavrin

@@ -160,7 +160,7 @@ void TAVNetworkRequestFactory::Recipe::addLookupItems(Recipe& r, const RequestCo
         std::string recognized = platform::recognizedLanguage(text);
         return recognized == "und" ? std::string() : recognized;
     };
-    r.item("context", lookup.clientContext.value_or(""));
+    r.builder.defaultQueryItemWithName("context", lookup.clientContext);
     r.item("ldomain", lookup.hintDomain.value_or(""));
     r.item("ltype", lookup.selectionType == LookupSelectionType::HintTap    ? "hint"
                     : lookup.selectionType == LookupSelectionType::Explicit ? "explicit"
@@ -261,8 +261,7 @@ UrlRequest TAVNetworkRequestFactory::build(Recipe& recipe)
 
     request.timeout = recipe.timeout;
     if (!request.timeout && recipe.bag)
-        if (const auto seconds = recipe.bag->timeoutIntervalForRequest())
-            request.timeout = requestTimeout(*seconds);
+        if (const auto seconds = recipe.bag->timeoutIntervalForRequest()) request.timeout = requestTimeout(*seconds);
     return request;
 }
 
@@ -306,7 +305,7 @@ TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::searchRequest(const 
     if (!url) return std::nullopt;
     _startLocationUpdate();
     Recipe recipe{
-        kSearch,         TavrinURLRequestBuilder::requestBuilderWithURL(*url), &request, &bag, userGuid, fieldMask,
+        kSearch,        TavrinURLRequestBuilder::requestBuilderWithURL(*url), &request, &bag, userGuid, fieldMask,
         bag.userAgent()};
     recipe.timeout = timeout;
     recipe.builder.forceQueryItemWithName("q", request.queryString);
@@ -323,17 +322,17 @@ TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::zeroKeywordRequest(c
     if (!url) return std::nullopt;
     _startLocationUpdate();
     Recipe recipe{
-        kZeroKeyword,    TavrinURLRequestBuilder::requestBuilderWithURL(*url), &request, &bag, userGuid, fieldMask,
+        kZeroKeyword,   TavrinURLRequestBuilder::requestBuilderWithURL(*url), &request, &bag, userGuid, fieldMask,
         bag.userAgent()};
     recipe.timeout = timeout;
     recipe.builder.forceQueryItemWithName("qtype", "zkw");
     return build(recipe);
 }
 
-TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::moreResultsRequest(const TAVMoreResultsRequest& request,
-                                                                               const TAVBag* bag, const Uuid& userGuid,
-                                                                               std::uint64_t fieldMask,
-                                                                               std::optional<Duration> timeout)
+TAVNetworkRequestFactory::Request
+TAVNetworkRequestFactory::moreResultsRequest(const TAVMoreResultsRequest& request, const TAVBag* bag,
+                                             const std::optional<std::string>& userAgent, const Uuid& userGuid,
+                                             std::uint64_t fieldMask, std::optional<Duration> timeout)
 {
     if (!request.moreResultsURL) return std::nullopt;
     Recipe recipe{kMoreResults,
@@ -342,7 +341,7 @@ TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::moreResultsRequest(c
                   bag,
                   userGuid,
                   fieldMask,
-                  bag ? bag->userAgent() : std::string()};
+                  userAgent.value_or("")};
     recipe.timeout = timeout;
     if (!recipe.builder.containsQueryItemWithName("latlng")) _startLocationUpdate();
     return build(recipe);
@@ -355,7 +354,7 @@ TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::lookupRequest(const 
     const auto url = bag.searchURL();
     if (!url) return std::nullopt;
     _startLocationUpdate();
-    Recipe recipe{kLookup,         TavrinURLRequestBuilder::requestBuilderWithURL(*url), &request, &bag, userGuid, 0,
+    Recipe recipe{kLookup,        TavrinURLRequestBuilder::requestBuilderWithURL(*url), &request, &bag, userGuid, 0,
                   bag.userAgent()};
     recipe.timeout = timeout;
     recipe.builder.forceQueryItemWithName("q", request.queryString);
@@ -368,7 +367,7 @@ TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::cardRequest(const TA
 {
     if (!request.cardURL) return std::nullopt;
     Recipe recipe{
-        kCard,           TavrinURLRequestBuilder::requestBuilderWithURL(*request.cardURL), &request, &bag, userGuid, 0,
+        kCard,          TavrinURLRequestBuilder::requestBuilderWithURL(*request.cardURL), &request, &bag, userGuid, 0,
         bag.userAgent()};
     recipe.timeout = timeout;
     return build(recipe);
@@ -381,7 +380,7 @@ TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::flightRequest(const 
     const auto url = bag.flightURL();
     if (!url) return std::nullopt;
     _startLocationUpdate();
-    Recipe recipe{kFlight,         TavrinURLRequestBuilder::requestBuilderWithURL(*url), &request, &bag, userGuid, 0,
+    Recipe recipe{kFlight,        TavrinURLRequestBuilder::requestBuilderWithURL(*url), &request, &bag, userGuid, 0,
                   bag.userAgent()};
     recipe.timeout = timeout;
     recipe.builder.forceQueryItemWithName("q", request.queryString);
@@ -446,9 +445,10 @@ void TAVNetworkRequestFactory::_setUpDebuggingQueryItems()
     if (!parameters) return;
     log().log("processing debug parameters: ({})", *parameters);
     std::string_view rest = *parameters;
-    while (!rest.empty()) {
-        const std::string_view piece = rest.substr(0, rest.find('&'));
-        rest.remove_prefix(std::min(piece.size() + 1, rest.size()));
+    for (std::size_t end = 0; end != std::string_view::npos;) {
+        end = rest.find('&');
+        const std::string_view piece = rest.substr(0, end);
+        if (end != std::string_view::npos) rest.remove_prefix(end + 1);
         const std::size_t equals = piece.find('=');
         const bool valid = equals != std::string_view::npos && equals > 0 && equals + 1 < piece.size() &&
                            piece.find('=', equals + 1) == std::string_view::npos;

@@ -94,8 +94,9 @@ public:
     [[nodiscard]] Request zeroKeywordRequest(const TAVRequest& request, const TAVBag& bag,
                                              const platform::Uuid& userGuid, std::uint64_t fieldMask = 0,
                                              std::optional<platform::Duration> timeout = {});
-    /// The bag may be missing.
+    /// The bag may be missing; hence the agent.
     [[nodiscard]] Request moreResultsRequest(const TAVMoreResultsRequest& request, const TAVBag* bag,
+                                             const std::optional<std::string>& userAgent,
                                              const platform::Uuid& userGuid, std::uint64_t fieldMask = 0,
                                              std::optional<platform::Duration> timeout = {});
     [[nodiscard]] Request lookupRequest(const TAVLookupRequest& request, const TAVBag& bag,

@@ -103,7 +103,7 @@ TEST_F(RequestFactoryTest, EveryKindCarriesItsColumnOfTheTable)
         {'a', factory->bagCacheRequest(*controller, "tavrind/1", "7")},
         {'s', *factory->searchRequest(*search, bag, guid)},
         {'z', *factory->zeroKeywordRequest(zeroKeyword, bag, guid)},
-        {'m', *factory->moreResultsRequest(more, &bag, guid)},
+        {'m', *factory->moreResultsRequest(more, &bag, bag.userAgent(), guid)},
         {'l', *factory->lookupRequest(lookup, bag, guid)},
         {'c', *factory->cardRequest(card, bag, guid)},
         {'f', *factory->flightRequest(flight, bag, guid)},
@@ -180,7 +180,7 @@ TEST_F(RequestFactoryTest, TheFieldMaskHidesPlaceAndApplications)
     const auto masked = kFieldMaskNoLocation;
     for (const auto& request : {factory->searchRequest(search, bag, guid, masked),
                                 factory->zeroKeywordRequest(zeroKeyword, bag, guid, masked),
-                                factory->moreResultsRequest(more, &bag, guid, masked)}) {
+                                factory->moreResultsRequest(more, &bag, bag.userAgent(), guid, masked)}) {
         EXPECT_FALSE(request->url.queryValue("latlng") || request->url.queryValue("geosrc"));
         EXPECT_FALSE(request->headers.find("X-Quorvane-Whitelisted-App-Signature"));
     }
@@ -215,7 +215,7 @@ TEST_F(RequestFactoryTest, WithoutUrlThereIsNoRequest)
     EXPECT_FALSE(factory->lookupRequest(TAVLookupRequest(), empty, guid));
     EXPECT_FALSE(factory->flightRequest(TAVFlightSearchRequest(), empty, guid));
     EXPECT_FALSE(factory->cardRequest(TAVCardRequest(), empty, guid));
-    EXPECT_FALSE(factory->moreResultsRequest(TAVMoreResultsRequest(), nullptr, guid));
+    EXPECT_FALSE(factory->moreResultsRequest(TAVMoreResultsRequest(), nullptr, {}, guid));
 }
 
 TEST_F(RequestFactoryTest, ALookupInNoLanguageSaysNone)
@@ -226,6 +226,7 @@ TEST_F(RequestFactoryTest, ALookupInNoLanguageSaysNone)
     const auto request = factory->lookupRequest(lookup, bag, guid);
     EXPECT_FALSE(request->url.queryValue("qlang") || request->url.queryValue("lctxlang"));
     EXPECT_EQ(request->url.queryValue("ltype"), "explicit");
+    EXPECT_TRUE(request->url.string().contains("&context&")) << request->url.string();
 }
 
 TEST_F(RequestFactoryTest, OnlyAllowedSourcesTellThePlace)
@@ -242,7 +243,8 @@ TEST_F(RequestFactoryTest, OnlyAllowedSourcesTellThePlace)
     TAVMoreResultsRequest more;
     more.moreResultsURL = Url::parse("https://m.example/x?latlng=1,2");
     const int before = device.location.updatesRequested;
-    (void)factory->moreResultsRequest(more, nullptr, guid);
+    const auto withoutBag = factory->moreResultsRequest(more, nullptr, "agent/1", guid);
+    EXPECT_EQ(*withoutBag->headers.find("User-Agent"), "agent/1");
     EXPECT_EQ(device.location.updatesRequested, before) << "its URL says where the search was made";
     (void)factory->searchRequest(TAVSearchRequest(), bag, guid);
     EXPECT_EQ(device.location.updatesRequested, before + 1);
@@ -251,7 +253,8 @@ TEST_F(RequestFactoryTest, OnlyAllowedSourcesTellThePlace)
 TEST_F(RequestFactoryTest, ChangesThatConcernTheBagAreTold)
 {
     int told = 0;
-    const auto token = device.notifications.observe(TAVBagRefreshRequired, [&](const auto&) { ++told; }, factory.get());
+    const auto token = device.notifications.observe(
+        TAVBagRefreshRequired, [&](const auto&) { ++told; }, factory.get());
     device.drain();
     EXPECT_EQ(told, 0) << "not for the first computation";
 
