@@ -159,7 +159,9 @@ public:
         std::lock_guard lock(_mutex);
         _handler = std::move(handler);
         if (std::exchange(_watching, true)) return;
-        _runLoop.execute(Priority::Default, [this] { watchFolders(); });
+        _runLoop.execute(Priority::Default, [this] {
+            afterSettling([this] { watchFolders(); }); // not now, for the start of the process isn't to wait for it
+        });
     }
 
 private:
@@ -192,13 +194,21 @@ private:
 
     void changed()
     {
-        if (_settling) return;
-        _settling = _clock.after(kSettleTime, [this] { _runLoop.execute(Priority::Default, [this] { settled(); }); });
+        if (!_settling) afterSettling([this] { settled(); });
+    }
+
+    template <class Job> void afterSettling(Job job)
+    {
+        _settling = _clock.after(kSettleTime, [this, job] {
+            _runLoop.execute(Priority::Default, [this, job] {
+                _settling.reset();
+                job();
+            });
+        });
     }
 
     void settled()
     {
-        _settling.reset();
         watchFolders(); // some may have come
         std::function<void()> handler;
         {
@@ -216,7 +226,7 @@ private:
     std::function<void()> _handler;                          // under the mutex
     bool _watching = false;                                  // under the mutex
     std::map<fs::path, std::unique_ptr<FileWatch>> _watches; // loop's thread, like the next
-    std::optional<Clock::TimerId> _settling;                 // until changes are told
+    std::optional<Clock::TimerId> _settling;                 // until changes are told, or first looked for
 };
 
 /// What the XML parser has met so far.

@@ -35,9 +35,9 @@ public:
 /// file ID wins. Not among them: what is hidden, and what names a program to try that isn't there. The version is that
 /// of the first release in the metadata beside them, "metainfo/IDENTIFIER.metainfo.xml" or ".appdata.xml".
 ///
-/// Nothing is read before it is asked for; changes are watched from the first `onChange` on. Links are followed: the
-/// directories are the system's, and some package formats install links. Limits, logged when they are met: 10,000
-/// applications, folders four deep, 1 MiB an entry, 4 MiB of metadata.
+/// Nothing is read before it is asked for; changes are watched from two seconds behind the first `onChange` on. Links
+/// are followed: the directories are the system's, and some package formats install links. Limits, logged when they are
+/// met: 10,000 applications, folders four deep and 32 of them watched, 1 MiB an entry, 4 MiB of metadata.
 [[nodiscard]] std::unique_ptr<InstalledApplications>
 makeInstalledApplications(FileSystem& files, std::vector<std::filesystem::path> dataDirectories, RunLoop& runLoop,
                           Clock& clock);

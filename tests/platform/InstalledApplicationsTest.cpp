@@ -115,7 +115,9 @@ TEST_F(InstalledApplicationsTest, ChangesAreToldOnceTheyHaveSettledAlsoInFolders
     int told = 0;
     const auto applications = make();
     applications->onChange([&] { ++told; });
-    loop.runOnce(Duration::zero()); // the watches are there now
+    loop.runOnce(Duration::zero());
+    clock.advance(std::chrono::seconds(2), [] {});
+    loop.runOnce(std::chrono::seconds(1)); // the watches are there now
     const auto settle = [&] {
         EXPECT_TRUE(test::runUntil(loop, [&] { return clock.pendingTimers() > 0; }));
         for (int i = 0; i < 5; ++i) loop.runOnce(Duration::zero()); // the same change, seen in other folders
