@@ -331,6 +331,7 @@ public:
     bool nextKey(std::string_view& name) override
     {
         if (!nextElement()) return false;
+        if (takeShortText(name)) return true; // as nearly every key is
         name = take(Value::Type::String, "a key").text();
         return !failed();
     }
@@ -354,19 +355,30 @@ private:
     /// The token at hand; null after a failure.
     const Token& here()
     {
-        if (!_isRead && !failed()) read();
-        if (failed()) _here = {};
+        if (!_isRead && !failed()) [[likely]] read();
+        if (failed()) [[unlikely]] _here = {};
         return _here;
     }
 
     /// The token at hand, which must be of that type; an empty one after a failure.
     Token take(Value::Type type, std::string_view expected)
     {
-        const Token token = here();
-        if (token.type != type) failExpecting(expected, token.type);
-        if (failed()) return {};
+        const Token& token = here();
+        if (token.type != type) [[unlikely]] failExpecting(expected, token.type);
+        if (failed()) [[unlikely]] return {};
         _isRead = false;
         return token;
+    }
+
+    /// Takes what comes next if it is a text whose length is in its first byte; false leaves it.
+    bool takeShortText(std::string_view& text)
+    {
+        if (_isRead || _next == _end) return false;
+        const Head& head = kHeads[static_cast<unsigned char>(*_next)];
+        if (head.type != Value::Type::String || head.width > 0 || head.number >= _end - _next) return false;
+        text = {_next + 1, head.number};
+        _next += 1 + head.number;
+        return true;
     }
 
     void read()
