@@ -100,17 +100,19 @@ struct HttpCache::Impl : std::enable_shared_from_this<Impl> {
         : configuration(std::move(configuration_)), memory(configuration.memoryCapacity)
     {}
 
-    Stored find(const std::string& key)
+    Stored find(const Url& url)
     {
+        const std::string key = cacheKey(url);
         if (Stored stored; decidedWithoutDisk(key, stored)) return stored;
-        return configuration.queue->sync([&] { return readFromDisk(key); });
+        return configuration.queue->sync([&] { return readFromDisk(key, url); });
     }
 
-    void lookUp(std::string key, Found found)
+    void lookUp(const Url& url, Found found)
     {
+        std::string key = cacheKey(url);
         if (Stored stored; decidedWithoutDisk(key, stored)) return found(std::move(stored));
-        configuration.queue->async([self = shared_from_this(), key = std::move(key),
-                                    found = std::move(found)]() mutable { found(self->readFromDisk(key)); });
+        configuration.queue->async([self = shared_from_this(), key = std::move(key), url,
+                                    found = std::move(found)]() mutable { found(self->readFromDisk(key, url)); });
     }
 
     void put(std::string key, StoredResponse stored)
@@ -181,10 +183,10 @@ private:
 
     // On the queue.
 
-    [[nodiscard]] Stored readFromDisk(const std::string& key)
+    [[nodiscard]] Stored readFromDisk(const std::string& key, const Url& url)
     {
         if (!openStore()) return nullptr;
-        auto found = store->find(key);
+        auto found = store->find(key, url);
         if (!found) {
             failed(found.error());
             return nullptr;
@@ -322,7 +324,7 @@ std::shared_ptr<HttpCache> HttpCache::make(HttpCacheConfiguration configuration)
 
 std::optional<CachedResponse> HttpCache::find(const Url& url)
 {
-    const Stored stored = _impl->find(cacheKey(url));
+    const Stored stored = _impl->find(url);
     return stored ? std::optional<CachedResponse>(*stored) : std::nullopt;
 }
 
@@ -347,7 +349,7 @@ void HttpCache::remove(const Url& url)
 
 void HttpCache::lookUp(const Url& url, Found found)
 {
-    _impl->lookUp(cacheKey(url), std::move(found));
+    _impl->lookUp(url, std::move(found));
 }
 
 Date HttpCache::now() const

@@ -261,7 +261,7 @@ Result<std::vector<std::string>> HttpCacheStore::keys()
     return keys;
 }
 
-Result<std::shared_ptr<const StoredResponse>> HttpCacheStore::find(const std::string& key)
+Result<std::shared_ptr<const StoredResponse>> HttpCacheStore::find(const std::string& key, const Url& likely)
 {
     std::optional<Row> row;
     auto read =
@@ -290,7 +290,7 @@ Result<std::shared_ptr<const StoredResponse>> HttpCacheStore::find(const std::st
     const bool mapped = !row->body;
     std::optional<Bytes> body =
         mapped ? mapBody(row->id, static_cast<std::uint64_t>(row->bodySize)) : Bytes(std::move(*row->body));
-    auto url = Url::parse(row->url);
+    auto url = row->url == likely.string() ? std::optional(likely) : Url::parse(row->url);
     if (!body || !url || row->digestWith(key, body->view()) != row->digest) {
         defaultLog().error("an answer in the HTTP cache is damaged and dropped: {}", row->id);
         if (auto removed = remove(key); !removed) return std::unexpected(std::move(removed.error()));

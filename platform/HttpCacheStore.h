@@ -36,8 +36,8 @@ public:
 
     /// Of all answers, in no order.
     [[nodiscard]] Result<std::vector<std::string>> keys();
-    /// Null where there is none, or it is damaged.
-    [[nodiscard]] Result<std::shared_ptr<const StoredResponse>> find(const std::string& key);
+    /// Null where there is none, or it is damaged. An answer whose URL is `likely`, too, needn't parse it.
+    [[nodiscard]] Result<std::shared_ptr<const StoredResponse>> find(const std::string& key, const Url& likely = {});
     /// Keeps the answer in place of an earlier one; answers the keys of those that had to go for it.
     [[nodiscard]] Result<std::vector<std::string>> put(const std::string& key, const StoredResponse& stored);
     [[nodiscard]] Result<void> remove(const std::string& key);
