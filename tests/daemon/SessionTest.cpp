@@ -1,6 +1,11 @@
 #include <algorithm>
+#include <iterator>
+#include <map>
+
+#include <fmt/format.h>
 
 #include "tavrind/ClientSession.h"
+#include "tavrind/TavrinService.h"
 #include "tavrind/TavrinUserGUIDController.h"
 #include "tests/support/FeedbackFixture.h"
 
@@ -199,6 +204,39 @@ TEST_F(SessionTest, OneSessionForEachUserAgentOfASharedOne)
     EXPECT_EQ(all[0]["user_guid"], all[1]["user_guid"]);
     EXPECT_EQ(typesIn(all[1]), (Types{"clear_input", "session_end"}));
     EXPECT_EQ(counter("Vistrel/4.sessions"), 1);
+}
+
+TEST_F(SessionTest, AThousandClientsComeAndGoAndEveryEventIsInItsClientsSession)
+{
+    for (const bool shared : {true, false}) {
+        SCOPED_TRACE(shared);
+        begin(shared);
+        connection->end();
+        for (int i = 0; i < 1000; ++i) {
+            connection = client(fmt::format("org.example.client{}", i), fmt::format("Client/{}", i), 1000 + i);
+            appear();
+            if (i % 3 == 0) report("ZRClearInputFeedback");
+            connection->end();
+            device.drain();
+        }
+        EXPECT_TRUE(daemon->service->getClientConnections().empty());
+        flushSession();
+        upload();
+        std::map<std::string, Types> events;
+        for (const auto& task : uploads()) {
+            const Value session = decoded(*task);
+            Types& all = events[*session["agent"].asString()];
+            std::ranges::copy_if(typesIn(session), std::back_inserter(all), [](const std::string& type) {
+                return type == "search_view_appear" || type == "clear_input";
+            });
+        }
+        for (int i = 0; i < 1000; ++i) {
+            const Types expected{"search_view_appear", "clear_input"};
+            EXPECT_EQ(events[fmt::format("Client/{}", i)], Types(expected.begin(), expected.begin() + (i % 3 ? 1 : 2)));
+        }
+        EXPECT_TRUE(sessionFiles().empty());
+        expectBooksClose();
+    }
 }
 
 TEST_F(SessionTest, EventsFromOutsideByNumber)
