@@ -96,7 +96,10 @@ void ClientSessionManager::addTavrinFeedback(std::shared_ptr<TavrinFeedback> fee
 
 bool ClientSessionManager::_wantsFeedback(const TavrinFeedback& feedback) const
 {
-    const auto bag = _assembly.bagController ? _assembly.bagController->currentBag() : nullptr;
+    if (!_assembly.bagController) return true;
+    TavrinBagController& bags = *_assembly.bagController;
+    // To see whether the bag is stale its URL is made, which costs more than an event: once for each session will do.
+    const auto bag = _session ? bags.inMemoryBag() : bags.currentBag();
     return !bag || TAVBag(bag->rawBag(), feedback.userAgent).feedbackEnabled();
 }
 

@@ -23,7 +23,6 @@ namespace fs = std::filesystem;
 
 namespace {
 
-
 constexpr const char* kTableKey = "download_resources";
 constexpr const char* kIdentifierHeader = "X-Quorvane-Download-Identifier";
 constexpr const char* kDirectory = "com.quorvane.tavrind";
