@@ -1,6 +1,7 @@
 #include "CoreTavrin/ResponseImages.h"
 
 #include "CoreTavrin/TAVBag.h"
+#include "platform/values/Dictionary.h"
 
 namespace tavrin {
 

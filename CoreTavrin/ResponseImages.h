@@ -6,8 +6,8 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/Url.h"
-#include "platform/Value.h"
+#include "platform/net/Url.h"
+#include "platform/values/Value.h"
 
 /// Which images an answer of the service names, and where they are; for the daemon, which fetches them ahead, and for
 /// clients, which ask for them. Pure functions, for answers of any shape: neither depth nor number costs stack.

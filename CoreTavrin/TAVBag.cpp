@@ -5,6 +5,8 @@
 #include <fmt/format.h>
 
 #include "CoreTavrin/ClientVocabulary.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 
 namespace tavrin {
 
@@ -12,8 +14,8 @@ using platform::Url;
 using platform::Value;
 
 const std::vector<std::string_view> kTAVResourceIdentifiers{
-    "TAVAutofillTLDWhitelist", kTAVInstalledAppWhitelist, "TAVQIFeatures",    "TAVWebsiteCategoryLabels",
-    kTAVLookupHintsWeekly,     kTAVLookupHintsMonthly,    "TAVVistrelModels", "TAVCorrectionDict",
+    "TAVAutofillTLDWhitelist",  kTAVInstalledAppWhitelist, "TAVQIFeatures",    "TAVWebsiteCategoryLabels",
+    kTAVLookupHintsWeekly,      kTAVLookupHintsMonthly,    "TAVVistrelModels", "TAVCorrectionDict",
     kTAVCrowdsourcingBlacklist, kTAVCrowdsourcingWhitelist};
 
 namespace {
@@ -138,19 +140,58 @@ std::string TAVBag::version() const
     return value.isNumber() ? platform::toJson(value) : std::string();
 }
 
-bool TAVBag::isEnabled() const { return boolean("isEnabled", true); }
-bool TAVBag::feedbackEnabled() const { return boolean("feedbackEnabled", true); }
-std::uint64_t TAVBag::minimumQueryLength() const { return get("minimumQueryLength").asUInt().value_or(1); }
-std::optional<double> TAVBag::timeoutIntervalForRequest() const { return secondsIn(get("timeoutIntervalForRequest")); }
-std::optional<Url> TAVBag::searchURL() const { return url("searchURL"); }
-std::optional<Url> TAVBag::warmURL() const { return url("warmURL"); }
-std::optional<Url> TAVBag::flightURL() const { return url("flightURL"); }
-std::optional<Url> TAVBag::feedbackURL() const { return url("feedbackURL"); }
-std::optional<Url> TAVBag::crowdsourcingURL() const { return url("crowdsourcingURL"); }
-std::optional<Url> TAVBag::resourceURL(std::string_view identifier) const { return url(identifier); }
-bool TAVBag::sendGeoEnvironmentHeader() const { return boolean("sendGeoEnvironmentHeader", false); }
-std::optional<bool> TAVBag::hashtagImagesVisible() const { return get("hashtagImagesVisible").asBool(); }
-double TAVBag::subscriptionTTL() const { return secondsIn(get("subscriptionTTL")).value_or(86400); }
+bool TAVBag::isEnabled() const
+{
+    return boolean("isEnabled", true);
+}
+bool TAVBag::feedbackEnabled() const
+{
+    return boolean("feedbackEnabled", true);
+}
+std::uint64_t TAVBag::minimumQueryLength() const
+{
+    return get("minimumQueryLength").asUInt().value_or(1);
+}
+std::optional<double> TAVBag::timeoutIntervalForRequest() const
+{
+    return secondsIn(get("timeoutIntervalForRequest"));
+}
+std::optional<Url> TAVBag::searchURL() const
+{
+    return url("searchURL");
+}
+std::optional<Url> TAVBag::warmURL() const
+{
+    return url("warmURL");
+}
+std::optional<Url> TAVBag::flightURL() const
+{
+    return url("flightURL");
+}
+std::optional<Url> TAVBag::feedbackURL() const
+{
+    return url("feedbackURL");
+}
+std::optional<Url> TAVBag::crowdsourcingURL() const
+{
+    return url("crowdsourcingURL");
+}
+std::optional<Url> TAVBag::resourceURL(std::string_view identifier) const
+{
+    return url(identifier);
+}
+bool TAVBag::sendGeoEnvironmentHeader() const
+{
+    return boolean("sendGeoEnvironmentHeader", false);
+}
+std::optional<bool> TAVBag::hashtagImagesVisible() const
+{
+    return get("hashtagImagesVisible").asBool();
+}
+double TAVBag::subscriptionTTL() const
+{
+    return secondsIn(get("subscriptionTTL")).value_or(86400);
+}
 
 std::vector<std::string> TAVBag::supportedGeoLocationSources() const
 {
@@ -184,8 +225,10 @@ std::vector<std::string> TAVBag::problems() const
     findProblems(_rawBag, "", problems);
     if (const platform::Dictionary* clients = _rawBag["clients"].asDictionary()) {
         for (const auto& [name, view] : *clients) {
-            if (view.asDictionary()) findProblems(view, fmt::format("clients.{}.", name), problems);
-            else problems.push_back(fmt::format("clients.{}: expected a dictionary", name));
+            if (view.asDictionary())
+                findProblems(view, fmt::format("clients.{}.", name), problems);
+            else
+                problems.push_back(fmt::format("clients.{}: expected a dictionary", name));
         }
     }
     return problems;

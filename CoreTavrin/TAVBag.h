@@ -7,17 +7,17 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/Record.h"
-#include "platform/Url.h"
-#include "platform/Value.h"
+#include "platform/net/Url.h"
+#include "platform/values/Record.h"
+#include "platform/values/Value.h"
 
 namespace tavrin {
 
 /// The bag: the service's configuration of the daemon, as one client sees it.
 ///
-/// Every accessor reads the top-level key of its own name. A dictionary under "clients" holds, by client name, keys that
-/// override the top level; the name that `extractClientNameFromString` finds in the user agent applies. A key that is
-/// missing or of the wrong type reads as its default. docs/bag.md lists every key.
+/// Every accessor reads the top-level key of its own name. A dictionary under "clients" holds, by client name, keys
+/// that override the top level; the name that `extractClientNameFromString` finds in the user agent applies. A key that
+/// is missing or of the wrong type reads as its default. docs/bag.md lists every key.
 ///
 /// Immutable and cheap to copy: any thread.
 class TAVBag {
@@ -28,8 +28,8 @@ public:
     [[nodiscard]] const platform::Value& rawBag() const { return _rawBag; }
     [[nodiscard]] const std::string& userAgent() const { return _userAgent; }
 
-    [[nodiscard]] std::string version() const; ///< a string, or a number read as one; ""
-    [[nodiscard]] bool isEnabled() const;      ///< true
+    [[nodiscard]] std::string version() const;  ///< a string, or a number read as one; ""
+    [[nodiscard]] bool isEnabled() const;       ///< true
     [[nodiscard]] bool feedbackEnabled() const; ///< true
     /// UTF-16 units; 1.
     [[nodiscard]] std::uint64_t minimumQueryLength() const;
@@ -46,9 +46,9 @@ public:
     /// The URL of a downloadable resource, by the resource's identifier.
     [[nodiscard]] std::optional<platform::Url> resourceURL(std::string_view identifier) const;
 
-    [[nodiscard]] bool sendGeoEnvironmentHeader() const;                      ///< false
+    [[nodiscard]] bool sendGeoEnvironmentHeader() const;                        ///< false
     [[nodiscard]] std::vector<std::string> supportedGeoLocationSources() const; ///< of "gps", "cell", "wifi"; none
-    [[nodiscard]] std::optional<bool> hashtagImagesVisible() const;           ///< none: leave as it is
+    [[nodiscard]] std::optional<bool> hashtagImagesVisible() const;             ///< none: leave as it is
     [[nodiscard]] std::optional<std::vector<std::string>> subscriptionProviderDomainWhitelist() const;
     [[nodiscard]] std::optional<std::vector<std::string>> subscriptionProviderBundleIdentifierWhitelist() const;
     [[nodiscard]] double subscriptionTTL() const; ///< seconds; 86400

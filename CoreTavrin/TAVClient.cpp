@@ -11,6 +11,10 @@
 #include "CoreTavrin/TAVReply.h"
 #include "CoreTavrin/TAVRequest.h"
 #include "CoreTavrin/TAVSessionConfiguration.h"
+#include "platform/files/Files.h"
+#include "platform/ipc/BusClient.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/ValueCoder.h"
 #include "searchrecords/ZRFeedback.h"
 
 namespace tavrin {
@@ -82,7 +86,7 @@ Value::Array arrayIn(const Value& value)
 
 Result<std::unique_ptr<ipc::Client>> TAVConnection::open(const std::string& address)
 {
-    return ipc::Client::connect(address, kConnectTimeout);
+    return ipc::Client::connect(address, std::string(kObjectPath), kConnectTimeout);
 }
 
 bool TAVConnection::wait(const std::function<bool()>& done, platform::Duration timeout, int descriptor)

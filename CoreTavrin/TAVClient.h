@@ -8,9 +8,10 @@
 #include <string>
 #include <vector>
 
-#include "platform/Error.h"
-#include "platform/Ipc.h"
-#include "platform/Value.h"
+#include "platform/ipc/BusClient.h"
+#include "platform/ipc/Ipc.h"
+#include "platform/values/Error.h"
+#include "platform/values/Value.h"
 
 /// The client's side of the daemon's IPC, for programs in C++. Other languages speak D-Bus: see docs/ipc.md.
 namespace tavrin {
@@ -54,8 +55,8 @@ public:
     /// How long the calls that wait do so; 30 s. A daemon that has just been started needs some of it.
     void setTimeout(platform::Duration timeout) { _timeout = timeout; }
     /// Runs callbacks until `done()`, and answers that; false when `timeout` passed or the connection ended before. A
-    /// program that waits for something else too, such as keys, gives its descriptor: `done` is asked again, and reads it,
-    /// whenever it can be read.
+    /// program that waits for something else too, such as keys, gives its descriptor: `done` is asked again, and reads
+    /// it, whenever it can be read.
     bool wait(const std::function<bool()>& done, platform::Duration timeout, int descriptor = -1);
     /// False once the daemon has closed the connection, as it does after an invalid configuration.
     [[nodiscard]] bool connected() const;
@@ -98,7 +99,8 @@ private:
     using TAVConnection::TAVConnection;
 };
 
-/// A connection to the flusher bridge, whose address `TAVClient::listenToFlusher` answers. A tool that watches then waits:
+/// A connection to the flusher bridge, whose address `TAVClient::listenToFlusher` answers. A tool that watches then
+/// waits:
 ///
 ///     auto bridge = tavrin::TAVFlusherClient::connect(endpoint, listener);
 ///     (*bridge)->initiateConnection(FlusherIntent::WatchEvents);
@@ -137,8 +139,8 @@ public:
     platform::Result<TAVBagAnswer> bag();
     platform::Result<TAVAnswer> request(const TAVRequest& request);
     void send(const TAVRequest& request, AnswerHandler handler);
-    /// Reports what the user saw or did. It is out once `wait` or another call has run; inside of which `taken` is called
-    /// when the daemon has it, or with the reason why it didn't take it.
+    /// Reports what the user saw or did. It is out once `wait` or another call has run; inside of which `taken` is
+    /// called when the daemon has it, or with the reason why it didn't take it.
     void reportEvent(const std::string& event, std::int64_t queryId, const ZRFeedback& feedback,
                      std::function<void(platform::Result<void>)> taken = {});
     /// The feedback of the current session, as it would be uploaded.

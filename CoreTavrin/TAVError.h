@@ -3,7 +3,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/Error.h"
+#include "platform/values/Error.h"
 
 namespace tavrin {
 
@@ -12,9 +12,9 @@ inline constexpr std::string_view TAVErrorDomain = "TAVErrorDomain";
 
 /// Codes in `TAVErrorDomain`.
 enum TAVErrorCode : std::int64_t {
-    TAVErrorTimeout = 1,         ///< no bag in time ("timeout"), or no user agent yet ("no UserAgent")
-    TAVErrorBagFetch = 2,        ///< the bag could not be fetched
-    TAVErrorNotFound = 404,      ///< no such resource
+    TAVErrorTimeout = 1,           ///< no bag in time ("timeout"), or no user agent yet ("no UserAgent")
+    TAVErrorBagFetch = 2,          ///< the bag could not be fetched
+    TAVErrorNotFound = 404,        ///< no such resource
     TAVErrorInvalidResponse = 500, ///< an answer or a configuration that makes no sense
 };
 

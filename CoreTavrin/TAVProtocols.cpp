@@ -9,9 +9,10 @@
 #include "CoreTavrin/TAVReply.h"
 #include "CoreTavrin/TAVRequest.h"
 #include "CoreTavrin/TAVSessionConfiguration.h"
-#include "searchrecords/ZRFeedback.h"
-
 #include "docs_ipc_xml.h" // made from docs/ipc/*.xml
+#include "platform/values/Dictionary.h"
+#include "platform/values/ValueCoder.h"
+#include "searchrecords/ZRFeedback.h"
 
 namespace tavrin {
 
@@ -157,6 +158,7 @@ OptionalError errorFromValue(const Value& value)
 const ipc::Interface& daemonInterface()
 {
     static const ipc::Interface interface{
+        .path = std::string(kObjectPath),
         .name = "com.quorvane.TAVDaemonXPC",
         .methods = {{"Configure", "a{sv}", "s"},
                     {"Bag", "", "a{sv}a{sv}"},
@@ -178,6 +180,7 @@ const ipc::Interface& daemonInterface()
 const ipc::Interface& endpointInterface()
 {
     static const ipc::Interface interface{
+        .path = std::string(kObjectPath),
         .name = "com.quorvane.TAVEndpointXPC",
         .methods = {{"Request", "a{sv}a{sv}", "xa{sv}a{sv}"}, {"LoadImages", "aa{sv}t", "a{sv}"}},
         .listenerName = "",
@@ -190,6 +193,7 @@ const ipc::Interface& endpointInterface()
 const ipc::Interface& flusherInterface()
 {
     static const ipc::Interface interface{
+        .path = std::string(kObjectPath),
         .name = "com.quorvane.TAVFlusherXPC",
         .methods = {{"InitiateConnectionWithIntent", "t", ""}},
         .listenerName = "com.quorvane.TAVFlusherListener",

@@ -6,9 +6,9 @@
 #include <string>
 #include <vector>
 
-#include "platform/Ipc.h"
-#include "platform/Reply.h"
-#include "platform/Value.h"
+#include "platform/ipc/Ipc.h"
+#include "platform/run/Reply.h"
+#include "platform/values/Value.h"
 
 /// The protocols that clients and the daemon speak, as types on the one side and as D-Bus interfaces on the other, and
 /// the thin adaptors between the two. docs/ipc.md describes the wire.
@@ -103,6 +103,9 @@ public:
 };
 
 /// The interfaces of the three kinds of connection.
+/// The path of every object that the daemon exports.
+inline constexpr std::string_view kObjectPath = "/com/quorvane/tavrind";
+
 [[nodiscard]] const platform::ipc::Interface& daemonInterface();
 [[nodiscard]] const platform::ipc::Interface& endpointInterface();
 [[nodiscard]] const platform::ipc::Interface& flusherInterface();

@@ -16,10 +16,11 @@ const platform::RecordClasses& coreRecordClasses()
         all.addAll(platform::RecordClasses::of<TAVSkipSearchFeedback, TAVLookupStartNetworkSearchFeedback,
                                                TAVEndNetworkSearchFeedback, TAVRankerFeedback, TAVCacheHitFeedback,
                                                TAVSearchSuggestion, TAVCustomSearchResult, TAVPunchout>());
-        all.addAll(platform::RecordClasses::of<TAVSessionConfiguration, TAVRequest, TAVSearchRequest, TAVZeroKeywordRequest,
-                                               TAVMoreResultsRequest, TAVCardRequest, TAVLookupRequest,
-                                               TAVFlightLookupRequest, TAVFlightSearchRequest, TAVQueryItem, TAVReply,
-                                               TAVHTTPRequest, TAVHTTPResponse, TAVBagRecord>());
+        all.addAll(
+            platform::RecordClasses::of<TAVSessionConfiguration, TAVRequest, TAVSearchRequest, TAVZeroKeywordRequest,
+                                        TAVMoreResultsRequest, TAVCardRequest, TAVLookupRequest, TAVFlightLookupRequest,
+                                        TAVFlightSearchRequest, TAVQueryItem, TAVReply, TAVHTTPRequest, TAVHTTPResponse,
+                                        TAVBagRecord>());
         return all;
     }();
     return classes;

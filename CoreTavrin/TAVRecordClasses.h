@@ -1,6 +1,6 @@
 #pragma once
 
-#include "platform/Record.h"
+#include "platform/values/Record.h"
 
 namespace tavrin {
 

@@ -5,7 +5,7 @@
 #include <optional>
 #include <string>
 
-#include "platform/Record.h"
+#include "platform/values/Record.h"
 
 namespace tavrin {
 

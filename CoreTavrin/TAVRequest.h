@@ -6,8 +6,8 @@
 #include <string>
 #include <vector>
 
-#include "platform/Record.h"
-#include "platform/Url.h"
+#include "platform/net/Url.h"
+#include "platform/values/Record.h"
 #include "searchrecords/ZREnums.h"
 
 /// What a client asks: one record for each kind of request, all with the fields of `TAVRequest`.
@@ -22,8 +22,7 @@ struct TAVQueryItem : platform::RecordOf<TAVQueryItem> {
     TAVQueryItem() = default;
     TAVQueryItem(std::string name_, std::optional<std::string> value_)
         : name(std::move(name_)), value(std::move(value_))
-    {
-    }
+    {}
     static constexpr auto fields()
     {
         return std::tuple{platform::field("name", &TAVQueryItem::name), platform::field("value", &TAVQueryItem::value)};
@@ -34,8 +33,8 @@ struct TAVQueryItem : platform::RecordOf<TAVQueryItem> {
 struct TAVRequest : platform::RecordOf<TAVRequest> {
     static constexpr std::string_view kClass = "TAVRequest";
 
-    std::string queryString;        ///< what the user typed
-    std::int64_t queryId = 0;       ///< rises with every request of a connection
+    std::string queryString;         ///< what the user typed
+    std::int64_t queryId = 0;        ///< rises with every request of a connection
     std::uint64_t clientQueryId = 0; ///< the client's own number for the query; 0 is none
     std::vector<std::shared_ptr<TAVQueryItem>> queryItems;
     double scale = 0;          ///< of the client's screen, for images; 0 is the main screen's
@@ -63,7 +62,8 @@ struct TAVRequest : platform::RecordOf<TAVRequest> {
 /// A search while the user types.
 struct TAVSearchRequest : platform::RecordOf<TAVSearchRequest, TAVRequest> {
     static constexpr std::string_view kClass = "TAVSearchRequest";
-    static std::shared_ptr<TAVSearchRequest> searchRequestWithString(std::string queryString, StartSearchTrigger triggerEvent)
+    static std::shared_ptr<TAVSearchRequest> searchRequestWithString(std::string queryString,
+                                                                     StartSearchTrigger triggerEvent)
     {
         auto request = std::make_shared<TAVSearchRequest>();
         request->queryString = std::move(queryString);

@@ -3,7 +3,7 @@
 #include <optional>
 #include <string>
 
-#include "platform/Record.h"
+#include "platform/values/Record.h"
 
 namespace tavrin {
 
@@ -23,8 +23,7 @@ struct TAVSessionConfiguration : platform::RecordOf<TAVSessionConfiguration> {
     TAVSessionConfiguration() = default;
     TAVSessionConfiguration(std::string identifier_, std::string userAgent_)
         : identifier(std::move(identifier_)), userAgent(std::move(userAgent_))
-    {
-    }
+    {}
 
     static constexpr auto fields()
     {

@@ -1,5 +1,5 @@
-// Session files: appended to, read for their upload, and the archives that they are made of. All figures are CPU time of
-// this process on one core.
+// Session files: appended to, read for their upload, and the archives that they are made of. All figures are CPU time
+// of this process on one core.
 
 #include <array>
 #include <fcntl.h>
@@ -13,13 +13,17 @@
 
 #include "bench/Feedback.h"
 #include "bench/Support.h"
-#include "platform/Clock.h"
-#include "platform/Counters.h"
-#include "platform/Files.h"
-#include "platform/Queue.h"
-#include "platform/Record.h"
-#include "platform/RunLoop.h"
-#include "platform/Transactions.h"
+#include "platform/files/Counters.h"
+#include "platform/files/Files.h"
+#include "platform/run/Clock.h"
+#include "platform/run/Queue.h"
+#include "platform/run/RunLoop.h"
+#include "platform/run/SystemClock.h"
+#include "platform/run/Transactions.h"
+#include "platform/run/WorkerPool.h"
+#include "platform/values/Archive.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Record.h"
 #include "tavrind/ClientSessionHeader.h"
 #include "tavrind/CompressedOutputStream.h"
 #include "tavrind/FeedbackBooks.h"
@@ -40,8 +44,8 @@ constexpr const char* kGuid = "01234567-89AB-4DEF-8123-456789ABCDEF";
 class Storage {
 public:
     Storage()
-        : _store(std::make_shared<const FileContainerStore>(FileContainerStore{
-              *files, _transactions, _diagnosticData, _books, _queue, "bench", kSessionSize}))
+        : _store(std::make_shared<const FileContainerStore>(
+              FileContainerStore{*files, _transactions, _diagnosticData, _books, _queue, "bench", kSessionSize}))
     {}
 
     [[nodiscard]] std::filesystem::path path(const std::string& name) const { return _directory / name; }
@@ -105,10 +109,10 @@ std::filesystem::path writeSession(const Storage& storage)
     const auto container = storage.newContainer(file);
     for (std::uint64_t search = 1; std::filesystem::file_size(file) < kSessionSize - (8u << 10); ++search) {
         for (auto& record : eventsOfSearch(search))
-            container->writeFeedback(
-                std::make_shared<TavrinFeedback>(std::move(record), static_cast<std::int64_t>(search), kGuid, "bench/1",
-                                                 search),
-                {});
+            container->writeFeedback(std::make_shared<TavrinFeedback>(std::move(record),
+                                                                      static_cast<std::int64_t>(search), kGuid,
+                                                                      "bench/1", search),
+                                     {});
         storage.drain();
     }
     container->close();
@@ -214,8 +218,9 @@ std::vector<Row> archive()
     const std::string bytes = platform::archive(*event);
     const msgpack::object_handle object = msgpack::unpack(bytes.data(), bytes.size());
     return {compare(
-                fmt::format("encoding a record into an archive of {} bytes, beside MessagePack's packer", bytes.size()), 9,
-                1.5, [&] { return cpuOfEach(kCalls, [&] { require(!platform::archive(*event).empty(), "archive"); }); },
+                fmt::format("encoding a record into an archive of {} bytes, beside MessagePack's packer", bytes.size()),
+                9, 1.5,
+                [&] { return cpuOfEach(kCalls, [&] { require(!platform::archive(*event).empty(), "archive"); }); },
                 [&] {
                     return cpuOfEach(kCalls, [&] {
                         msgpack::sbuffer buffer;

@@ -3,9 +3,9 @@
 
 #include <fmt/format.h>
 
-#include "CoreTavrin/TAVProtocols.h"
 #include "bench/Feedback.h"
 #include "bench/Support.h"
+#include "CoreTavrin/TAVProtocols.h"
 #include "searchrecords/ZRFeedback.h"
 
 namespace tavrin::bench {
@@ -25,7 +25,8 @@ int report(const Clients& clients, int count)
     int sent = 0;
     while (sent < count) {
         for (const auto& client : clients)
-            for (int i = 0; i < kBurst; ++i) client->reportEvent("event", 1, *events[static_cast<std::size_t>(i) % events.size()]);
+            for (int i = 0; i < kBurst; ++i)
+                client->reportEvent("event", 1, *events[static_cast<std::size_t>(i) % events.size()]);
         for (const auto& client : clients) require(client->sessions().has_value(), "the server doesn't answer");
         sent += kBurst * kClients;
     }

@@ -1,7 +1,6 @@
-#include "bench/Feedback.h"
-
 #include <fmt/format.h>
 
+#include "bench/Feedback.h"
 #include "CoreTavrin/TAVFeedback.h"
 #include "searchrecords/ZRRecords.h"
 #include "tavrind/TavrinFeedback.h"
@@ -73,7 +72,8 @@ std::shared_ptr<TavrinFeedback> kilobyteEvent()
     record->triggerEvent = VisibleResultsTrigger::Scroll;
     record->results = results(1, 2);
     record->timestamp = kSecond;
-    return std::make_shared<TavrinFeedback>(std::move(record), 12, "01234567-89AB-4DEF-8123-456789ABCDEF", "bench/1", 3);
+    return std::make_shared<TavrinFeedback>(std::move(record), 12, "01234567-89AB-4DEF-8123-456789ABCDEF", "bench/1",
+                                            3);
 }
 
 std::vector<std::shared_ptr<ZRFeedback>> eventsOfSearch(std::uint64_t number)

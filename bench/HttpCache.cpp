@@ -1,5 +1,7 @@
 // The HTTP cache: what a hit costs until all bytes of the body are in a buffer of the asker's.
 
+#include "platform/net/HttpCache.h"
+
 #include <array>
 #include <cstdlib>
 #include <cstring>
@@ -11,11 +13,12 @@
 #include <fmt/format.h>
 
 #include "bench/Support.h"
-#include "platform/Clock.h"
-#include "platform/Files.h"
-#include "platform/HttpCache.h"
-#include "platform/Queue.h"
-#include "platform/RunLoop.h"
+#include "platform/files/Files.h"
+#include "platform/run/Clock.h"
+#include "platform/run/Queue.h"
+#include "platform/run/RunLoop.h"
+#include "platform/run/SystemClock.h"
+#include "platform/run/WorkerPool.h"
 
 namespace tavrin::bench {
 
@@ -113,7 +116,7 @@ std::vector<Row> httpCache()
                 return each([&](int number, char* buffer) {
                     const platform::FileHandle file(
                         ::open(files[static_cast<std::size_t>(number)].c_str(), O_RDONLY | O_CLOEXEC));
-                    struct stat status {};
+                    struct stat status{};
                     require(fstat(file.fd(), &status) == 0 && read(file.fd(), buffer, kBodySize) == kBodySize,
                             "reading");
                 });

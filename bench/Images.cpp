@@ -1,20 +1,21 @@
 // The images that an answer names, fetched over HTTP/2 and handed to the client, beside a program that fetches the same
 // list with libcurl; both on a warm connection. nghttpx speaks HTTP/2 in front of the development service.
 
+#include <arpa/inet.h>
 #include <cstdlib>
 #include <filesystem>
-
-#include <arpa/inet.h>
-#include <curl/curl.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include <curl/curl.h>
 #include <fmt/format.h>
 
 #include "bench/Support.h"
 #include "CoreTavrin/TAVReply.h"
 #include "CoreTavrin/TAVRequest.h"
 #include "CoreTavrin/TAVSessionConfiguration.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 
 namespace tavrin::bench {
 

@@ -7,10 +7,11 @@
 
 #include <fmt/format.h>
 
+#include "bench/Support.h"
 #include "CoreTavrin/TAVProtocols.h"
 #include "CoreTavrin/TAVReply.h"
 #include "CoreTavrin/TAVRequest.h"
-#include "bench/Support.h"
+#include "platform/values/Json.h"
 
 namespace tavrin::bench {
 
@@ -135,7 +136,8 @@ std::vector<Row> waiters()
         if (!client->wait([&] { return waits.size() > before; }, std::chrono::seconds(10))) std::abort();
     }
     const double slowest = std::ranges::max(waits);
-    return {{"500 clients wait for the first bag: the slowest answer", fmt::format("{:.2f} s", slowest), "", slowest, 1.2, "s"}};
+    return {{"500 clients wait for the first bag: the slowest answer", fmt::format("{:.2f} s", slowest), "", slowest,
+             1.2, "s"}};
 }
 
 std::vector<Row> idle()

@@ -15,8 +15,10 @@
 
 #include "bench/Support.h"
 #include "CoreTavrin/TAVRequest.h"
-#include "platform/InstalledApplications.h"
-#include "platform/Log.h"
+#include "platform/base/Log.h"
+#include "platform/device/InstalledApplications.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "tavrind/AppWhitelistController.h"
 #include "tavrind/encoder.h"
 #include "tavrind/Lookup.h"

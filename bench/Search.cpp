@@ -6,9 +6,9 @@
 #include <curl/curl.h>
 #include <simdjson.h>
 
+#include "bench/Support.h"
 #include "CoreTavrin/TAVReply.h"
 #include "CoreTavrin/TAVRequest.h"
-#include "bench/Support.h"
 
 namespace tavrin::bench {
 
@@ -22,10 +22,11 @@ public:
     {
         curl_easy_setopt(_curl, CURLOPT_URL, url.c_str());
         curl_easy_setopt(_curl, CURLOPT_WRITEDATA, &_body);
-        curl_easy_setopt(_curl, CURLOPT_WRITEFUNCTION, +[](char* data, std::size_t size, std::size_t count, void* body) {
-            static_cast<std::string*>(body)->append(data, size * count);
-            return size * count;
-        });
+        curl_easy_setopt(
+            _curl, CURLOPT_WRITEFUNCTION, +[](char* data, std::size_t size, std::size_t count, void* body) {
+                static_cast<std::string*>(body)->append(data, size * count);
+                return size * count;
+            });
     }
     ~PlainClient() { curl_easy_cleanup(_curl); }
     void request()
@@ -67,11 +68,13 @@ std::vector<Row> search()
         if (!answer || !answer->reply || answer->reply->rawResponse->size() < kAnswerSize) std::abort();
     };
     std::vector<Row> rows;
-    rows.push_back(compare("search, 60 KB answer, beside libcurl and simdjson", 9, 2, [&] { return run(500, ours); },
-                           [&] { return run(500, [&] { plain.request(); }); }));
+    rows.push_back(compare(
+        "search, 60 KB answer, beside libcurl and simdjson", 9, 2, [&] { return run(500, ours); },
+        [&] { return run(500, [&] { plain.request(); }); }));
     service.setDelay(0.02);
-    rows.push_back(compare("the same with 20 ms of service delay", 5, 1.05, [&] { return run(50, ours); },
-                           [&] { return run(50, [&] { plain.request(); }); }));
+    rows.push_back(compare(
+        "the same with 20 ms of service delay", 5, 1.05, [&] { return run(50, ours); },
+        [&] { return run(50, [&] { plain.request(); }); }));
     return rows;
 }
 

@@ -20,6 +20,8 @@
 
 #include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVSessionConfiguration.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 
 namespace tavrin::bench {
 

@@ -14,6 +14,8 @@
 #include <vector>
 
 #include "CoreTavrin/TAVClient.h"
+#include "platform/values/Archive.h"
+#include "platform/values/Dictionary.h"
 
 namespace tavrin::bench {
 

@@ -1,5 +1,5 @@
 #include "fuzz/Check.h"
-#include "platform/InstalledApplications.h"
+#include "platform/device/InstalledApplications.h"
 #include "tavrind/AppWhitelistController.h"
 #include "tavrind/decoder.h"
 

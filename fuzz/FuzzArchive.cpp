@@ -1,7 +1,8 @@
 #include "fuzz/Records.h"
+#include "platform/values/Archive.h"
 
-/// An archive of any record, as a session file holds it. What decodes can be encoded again, to an equal record; and so it
-/// is for the archive read as plain values.
+/// An archive of any record, as a session file holds it. What decodes can be encoded again, to an equal record; and so
+/// it is for the archive read as plain values.
 int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
 {
     const auto record = platform::unarchive(textOf(data, size), tavrin::tavrindRecordClasses());

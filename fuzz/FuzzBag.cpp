@@ -3,6 +3,7 @@
 
 #include "CoreTavrin/TAVBag.h"
 #include "fuzz/Check.h"
+#include "platform/values/Json.h"
 
 using namespace tavrin;
 

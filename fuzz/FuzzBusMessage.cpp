@@ -4,7 +4,9 @@
 
 #include "fuzz/Check.h"
 #include "fuzz/Values.h"
-#include "platform/BusMessage.h"
+#include "platform/ipc/BusMessage.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 
 using namespace platform;
 
@@ -41,7 +43,8 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
     const auto message = newMessage();
     const auto written = ipc::encodeArguments(message.get(), "a{sv}", {.args = {value}, .handles = {}});
     if (!written) {
-        check(!written.error().empty() && (fuzz::anyOf(value, fuzz::hasNullElement) || fuzz::depthOf(value) > kSafeDepth),
+        check(!written.error().empty() &&
+                  (fuzz::anyOf(value, fuzz::hasNullElement) || fuzz::depthOf(value) > kSafeDepth),
               written.error());
         return 0;
     }

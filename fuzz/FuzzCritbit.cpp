@@ -3,8 +3,8 @@
 #include "fuzz/Check.h"
 #include "tests/support/CritbitModel.h"
 
-/// The input is a list of operations on a tree: a byte that says which, one with the length of the key or prefix, and its
-/// bytes, of any value. The tree must do what a map does.
+/// The input is a list of operations on a tree: a byte that says which, one with the length of the key or prefix, and
+/// its bytes, of any value. The tree must do what a map does.
 int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
 {
     tavrin::test::CritbitModel model;

@@ -2,7 +2,7 @@
 #include <set>
 
 #include "fuzz/Check.h"
-#include "platform/Text.h"
+#include "platform/text/Text.h"
 #include "tavrind/DeepLinks.h"
 
 namespace {

@@ -6,6 +6,10 @@
 #include "CoreTavrin/TAVRecordClasses.h"
 #include "fuzz/Sessions.h"
 #include "fuzz/Values.h"
+#include "platform/values/Archive.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
+#include "platform/values/ValueCoder.h"
 #include "searchrecords/ZRRecords.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/ClientSessionManager.h"
@@ -68,8 +72,8 @@ constexpr std::size_t kTooDeep = 24;
 
 } // namespace
 
-/// Events that a client reports, as a JSON array of records, with bytes and dates as `fuzz::enriched` has them. What the
-/// daemon takes is in a session's file, as it came, and makes an upload.
+/// Events that a client reports, as a JSON array of records, with bytes and dates as `fuzz::enriched` has them. What
+/// the daemon takes is in a session's file, as it came, and makes an upload.
 int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
 {
     const auto json = platform::parseJson(textOf(data, size));

@@ -4,8 +4,8 @@
 #include <unistd.h>
 
 #include "fuzz/Check.h"
-#include "platform/HttpCachePolicy.h"
-#include "platform/HttpCacheStore.h"
+#include "platform/net/HttpCachePolicy.h"
+#include "platform/net/HttpCacheStore.h"
 #include "tests/support/TemporaryDirectory.h"
 
 using namespace platform;

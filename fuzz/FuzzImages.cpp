@@ -3,6 +3,8 @@
 #include "CoreTavrin/ResponseImages.h"
 #include "CoreTavrin/TAVBag.h"
 #include "fuzz/Check.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 
 using platform::Value;
 

@@ -1,6 +1,7 @@
 #include "fuzz/Check.h"
 #include "fuzz/Values.h"
-#include "platform/Error.h"
+#include "platform/values/Error.h"
+#include "platform/values/Json.h"
 
 using namespace platform;
 

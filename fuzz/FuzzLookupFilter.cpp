@@ -1,6 +1,7 @@
 #include "CoreTavrin/TAVRequest.h"
 #include "fuzz/Check.h"
-#include "platform/Log.h"
+#include "platform/base/Log.h"
+#include "platform/values/Json.h"
 #include "tavrind/Lookup.h"
 
 /// The input is the text around a word, and from the second line on a lookup's answer. Filtering drops results, in

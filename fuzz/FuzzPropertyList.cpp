@@ -2,7 +2,9 @@
 
 #include "fuzz/Check.h"
 #include "fuzz/Values.h"
-#include "platform/Error.h"
+#include "platform/values/Error.h"
+#include "platform/values/Json.h"
+#include "platform/values/PropertyList.h"
 
 using namespace platform;
 

@@ -1,5 +1,7 @@
 #include "fuzz/Records.h"
 #include "fuzz/Values.h"
+#include "platform/values/Json.h"
+#include "platform/values/ValueCoder.h"
 
 /// A record as a dictionary, as clients send it. The input is its JSON text, with bytes and dates as
 /// `fuzz::enriched` has them.

@@ -2,13 +2,13 @@
 #include <vector>
 
 #include "fuzz/Check.h"
-#include "platform/Url.h"
+#include "platform/net/Url.h"
 #include "tavrind/TavrinURLRequestBuilder.h"
 
 using namespace platform;
 
-/// The input is a URL, and below it lines "f name=value" or "d name=value" that are forced and defaulted. The request's query
-/// is sorted, has each name once with the value that counts, and no ";"; made again it is the same.
+/// The input is a URL, and below it lines "f name=value" or "d name=value" that are forced and defaulted. The request's
+/// query is sorted, has each name once with the value that counts, and no ";"; made again it is the same.
 int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
 {
     std::string_view rest = textOf(data, size);
@@ -24,8 +24,10 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
     std::vector<QueryItem> expected; // each name once, the last forced value
     const auto expect = [&](const QueryItem& item, bool forced) {
         const auto found = std::ranges::find(expected, item.name, &QueryItem::name);
-        if (found == expected.end()) expected.push_back(item);
-        else if (forced) found->value = item.value;
+        if (found == expected.end())
+            expected.push_back(item);
+        else if (forced)
+            found->value = item.value;
     };
     for (const QueryItem& item : UrlComponents(*url).queryItems()) expect(item, true);
     while (!rest.empty()) {
@@ -36,8 +38,10 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
         QueryItem item(std::string(pair.substr(0, equals)));
         if (equals != std::string_view::npos) item.value = pair.substr(equals + 1);
         const bool forced = text[0] == 'f';
-        if (forced) builder.forceQueryItem(item);
-        else builder.defaultQueryItem(item);
+        if (forced)
+            builder.forceQueryItem(item);
+        else
+            builder.defaultQueryItem(item);
         expect(item, forced);
     }
 
@@ -47,8 +51,9 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
     check(made.query().value_or("").find(';') == std::string::npos, made.string());
     std::ranges::sort(expected, {}, &QueryItem::name);
     const auto items = UrlComponents(made).queryItems();
-    check(std::ranges::equal(items, expected,
-                             [](const QueryItem& a, const QueryItem& b) { return a.name == b.name && a.value == b.value; }),
+    check(std::ranges::equal(
+              items, expected,
+              [](const QueryItem& a, const QueryItem& b) { return a.name == b.name && a.value == b.value; }),
           made.string());
     return 0;
 }

@@ -2,10 +2,12 @@
 #include <bit>
 
 #include "fuzz/Sessions.h"
-#include "platform/Counters.h"
-#include "platform/Log.h"
-#include "platform/Record.h"
-#include "platform/Transactions.h"
+#include "platform/base/Log.h"
+#include "platform/files/Counters.h"
+#include "platform/run/Transactions.h"
+#include "platform/values/Archive.h"
+#include "platform/values/Json.h"
+#include "platform/values/Record.h"
 #include "tavrind/ClientSessionHeader.h"
 #include "tavrind/FileContainer.h"
 #include "tavrind/TavrinDiagnosticDataReporter.h"
@@ -37,15 +39,16 @@ void readFile(std::string contents)
     TavrinDiagnosticDataReporter diagnosticData(counters);
     const auto queue = platform::Queue::make("storage", platform::Queue::Kind::Serial, executor, clock);
     FeedbackBooks books(files, "/books.json", queue);
-    const auto store = std::make_shared<const FileContainerStore>(FileContainerStore{
-        files, transactions, diagnosticData, books, queue, "tavrind/1", 4u << 20});
+    const auto store = std::make_shared<const FileContainerStore>(
+        FileContainerStore{files, transactions, diagnosticData, books, queue, "tavrind/1", 4u << 20});
 
     files.files[kFile] = std::move(contents);
     const std::uint64_t count = FileContainer::countFeedback(*store, kFile);
     books.find(FeedbackFate::Closed, count);
     const auto session = std::make_shared<FileContainer>(store, kFile, count)->read();
     const std::size_t events = session ? session->recordedEvents() : 0;
-    check(books.count(FeedbackFate::Closed) == static_cast<std::int64_t>(events), platform::toJson(books.description()));
+    check(books.count(FeedbackFate::Closed) == static_cast<std::int64_t>(events),
+          platform::toJson(books.description()));
     fuzz::checkBooks(books);
     if (!session) return;
     for (const auto& event : session->feedbacks()) (void)event->description();
@@ -60,6 +63,7 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
     platform::Log::threshold = platform::LogLevel::Fault;
     const std::string_view input = textOf(data, size);
     readFile(std::string(input));
-    readFile(framed(platform::archiveValue("tavrind/1")) + framed(platform::archive(ClientSessionHeader())) + framed(input));
+    readFile(framed(platform::archiveValue("tavrind/1")) + framed(platform::archive(ClientSessionHeader())) +
+             framed(input));
     return 0;
 }

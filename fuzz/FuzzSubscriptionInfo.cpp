@@ -1,5 +1,5 @@
 #include "fuzz/Check.h"
-#include "platform/Text.h"
+#include "platform/text/Text.h"
 #include "tavrind/TavrinSubscriptionInfo.h"
 
 /// The input is a text of pairs. What is read of it, put together again, reads as the same.

@@ -1,7 +1,7 @@
 #include <algorithm>
 
 #include "fuzz/Check.h"
-#include "platform/Url.h"
+#include "platform/net/Url.h"
 
 using namespace platform;
 

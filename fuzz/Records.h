@@ -1,7 +1,11 @@
 #pragma once
 
 #include "fuzz/Check.h"
-#include "platform/Record.h"
+#include "platform/values/Archive.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
+#include "platform/values/Record.h"
+#include "platform/values/ValueCoder.h"
 #include "tavrind/SessionProcessingHelper.h"
 #include "tavrind/TavrinFeedback.h"
 

@@ -1,8 +1,9 @@
 #pragma once
 
 #include "fuzz/Check.h"
-#include "platform/Error.h"
-#include "platform/Value.h"
+#include "platform/values/Error.h"
+#include "platform/values/Json.h"
+#include "platform/values/Value.h"
 #include "tavrind/FeedbackBooks.h"
 #include "tavrind/OutputStream.h"
 #include "tavrind/StoredSession.h"

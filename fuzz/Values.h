@@ -6,8 +6,9 @@
 #include <string>
 #include <string_view>
 
-#include "platform/BusMessage.h"
-#include "platform/Value.h"
+#include "platform/ipc/BusMessage.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Value.h"
 
 /// Help for fuzz targets whose input is a JSON text that stands for a richer value.
 namespace fuzz {

@@ -2,7 +2,7 @@
 
 #include <cstdint>
 
-#include "platform/Record.h"
+#include "platform/values/Record.h"
 
 namespace tavrin {
 

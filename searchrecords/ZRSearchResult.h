@@ -6,7 +6,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/Record.h"
+#include "platform/values/Record.h"
 #include "searchrecords/ZREnums.h"
 
 /// What a search finds: results, sections of them, and suggestions.

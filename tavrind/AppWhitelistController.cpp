@@ -5,10 +5,10 @@
 #include <vector>
 
 #include "CoreTavrin/TAVBag.h"
-#include "platform/Device.h"
-#include "platform/InstalledApplications.h"
-#include "platform/JsonDocument.h"
-#include "platform/UserDefaults.h"
+#include "platform/device/Device.h"
+#include "platform/device/InstalledApplications.h"
+#include "platform/files/UserDefaults.h"
+#include "platform/values/Json.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/DownloadManager.h"
 #include "tavrind/encoder.h"

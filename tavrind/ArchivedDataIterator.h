@@ -4,7 +4,7 @@
 #include <optional>
 #include <string_view>
 
-#include "platform/Bytes.h"
+#include "platform/base/Bytes.h"
 
 namespace tavrin {
 

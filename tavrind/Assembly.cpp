@@ -1,7 +1,7 @@
 #include "tavrind/Assembly.h"
 
-#include "platform/Device.h"
-#include "platform/UserDefaults.h"
+#include "platform/device/Device.h"
+#include "platform/files/UserDefaults.h"
 
 namespace tavrin {
 

@@ -1,8 +1,8 @@
 #include "tavrind/BackgroundActivitiesManager.h"
 
-#include "platform/Device.h"
-#include "platform/Queue.h"
-#include "platform/Transactions.h"
+#include "platform/device/Device.h"
+#include "platform/run/Queue.h"
+#include "platform/run/Transactions.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/FeedbackBooks.h"
 #include "tavrind/FileContainer.h"
@@ -65,9 +65,8 @@ std::shared_ptr<BackgroundActivitiesManager> BackgroundActivitiesManager::make(A
 }
 
 BackgroundActivitiesManager::BackgroundActivitiesManager(Assembly& assembly)
-    : _assembly(assembly),
-      _queueFlusher(assembly.device.serialQueue("com.quorvane.tavrind.backgrondActivitiesManagerQueue",
-                                                 platform::Priority::Background)),
+    : _assembly(assembly), _queueFlusher(assembly.device.serialQueue(
+                               "com.quorvane.tavrind.backgrondActivitiesManagerQueue", platform::Priority::Background)),
       _feedbackFlusher(TavrinFeedbackFlusher::make(assembly, 1))
 {}
 

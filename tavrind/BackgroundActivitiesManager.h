@@ -6,7 +6,7 @@
 #include <mutex>
 #include <set>
 
-#include "platform/BackgroundSession.h"
+#include "platform/net/BackgroundSession.h"
 
 namespace platform {
 class Activity;

@@ -4,8 +4,9 @@
 #include <cmath>
 #include <cstdlib>
 
-#include "platform/Error.h"
-#include "platform/Text.h"
+#include "platform/text/Text.h"
+#include "platform/values/Error.h"
+#include "platform/values/Json.h"
 
 namespace tavrin {
 

@@ -6,10 +6,10 @@
 #include <span>
 #include <string>
 
-#include "platform/Bytes.h"
-#include "platform/UrlSession.h"
-#include "platform/Uuid.h"
-#include "platform/Value.h"
+#include "platform/base/Bytes.h"
+#include "platform/base/Uuid.h"
+#include "platform/net/UrlSession.h"
+#include "platform/values/Value.h"
 
 namespace tavrin {
 

@@ -8,7 +8,7 @@
 #include <string>
 
 #include "CoreTavrin/TAVProtocols.h"
-#include "platform/NotificationCenter.h"
+#include "platform/run/NotificationCenter.h"
 
 namespace tavrin {
 

@@ -4,12 +4,12 @@
 #include <array>
 
 #include "CoreTavrin/TAVError.h"
-#include "platform/Calendar.h"
-#include "platform/Clock.h"
-#include "platform/Device.h"
-#include "platform/LocaleSource.h"
-#include "platform/Text.h"
-#include "platform/UserDefaults.h"
+#include "platform/device/Device.h"
+#include "platform/device/LocaleSource.h"
+#include "platform/files/UserDefaults.h"
+#include "platform/run/Clock.h"
+#include "platform/text/Calendar.h"
+#include "platform/text/Text.h"
 #include "searchrecords/ZRErrorFeedback.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/ClientSessionManager.h"
@@ -44,15 +44,16 @@ std::optional<std::string_view> firstNamed(std::string_view text, const std::arr
 
 std::optional<std::string> firstUseKey(std::string_view userAgent)
 {
-    static constexpr std::array<std::string_view, 6> kClients{"wendral", "vistrel", "lookup", "messages", "news", "kivo"};
+    static constexpr std::array<std::string_view, 6> kClients{"wendral",  "vistrel", "lookup",
+                                                              "messages", "news",    "kivo"};
     const auto client = firstNamed(userAgent, kClients);
     return client ? std::optional("TavrinFirstUseOfTheDay_" + std::string(*client)) : std::nullopt;
 }
 
 std::optional<std::string_view> dailyActiveClient(std::string_view firstUseKey)
 {
-    static constexpr std::array<std::string_view, 7> kClients{"wendral", "vistrel",  "kivo",   "lookup",
-                                                              "messages", "news", "tavrind"};
+    static constexpr std::array<std::string_view, 7> kClients{"wendral",  "vistrel", "kivo",   "lookup",
+                                                              "messages", "news",    "tavrind"};
     return firstNamed(firstUseKey, kClients);
 }
 

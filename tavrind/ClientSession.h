@@ -7,7 +7,7 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/Value.h"
+#include "platform/values/Value.h"
 #include "tavrind/ClientSessionHeader.h"
 
 namespace platform {
@@ -37,8 +37,8 @@ public:
     virtual void enumerateSessions(const std::function<void(ClientSession& session, bool last)>& callback) = 0;
 };
 
-/// One session of one user agent: what the user saw and did, written to a file of its own as it comes, until the session
-/// is complete.
+/// One session of one user agent: what the user saw and did, written to a file of its own as it comes, until the
+/// session is complete.
 /// (`StoredSession` is what its file gives.) Any thread.
 class ClientSession final : public Session {
 public:

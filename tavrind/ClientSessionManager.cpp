@@ -7,8 +7,8 @@
 
 #include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVSessionConfiguration.h"
-#include "platform/Clock.h"
-#include "platform/Device.h"
+#include "platform/device/Device.h"
+#include "platform/run/Clock.h"
 #include "searchrecords/ZRErrorFeedback.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/BackgroundActivitiesManager.h"
@@ -61,17 +61,17 @@ constexpr std::initializer_list<SessionState> kWithoutSession{None};
 
 const ClientSessionManager::Transition ClientSessionManager::kTransitions[] = {
     // event                        acts in          action                                          next
-    {SessionEvent::AddFeedback,     kInSession,      &ClientSessionManager::_add,                    {}},
-    {SessionEvent::AddFeedback,     kWithoutSession, &ClientSessionManager::_begin,                  Open},
-    {SessionEvent::SoftLimit,       kWhenOpen,       &ClientSessionManager::_nothing,                SoftLimit},
-    {SessionEvent::MaxTime,         kAtSoftLimit,    &ClientSessionManager::_endMaxTime,             None},
-    {SessionEvent::ExternalFlush,   kAnyState,       &ClientSessionManager::_endExternal,            None},
-    {SessionEvent::MemoryWarning,   kAnyState,       &ClientSessionManager::_requestFlush,           {}},
-    {SessionEvent::CriticalMemory,  kAnyState,       &ClientSessionManager::_endCriticalMemory,      None},
-    {SessionEvent::MemoryNormal,    kAnyState,       &ClientSessionManager::_requestFlush,           {}},
-    {SessionEvent::Idle,            kAtSoftLimit,    &ClientSessionManager::_endIdleAndBegin,        Open},
-    {SessionEvent::GuidChanged,     kInSession,      &ClientSessionManager::_endGuidChangedAndBegin, Open},
-    {SessionEvent::Engagement,      kAtSoftLimit,    &ClientSessionManager::_endEngagement,          None},
+    {SessionEvent::AddFeedback, kInSession, &ClientSessionManager::_add, {}},
+    {SessionEvent::AddFeedback, kWithoutSession, &ClientSessionManager::_begin, Open},
+    {SessionEvent::SoftLimit, kWhenOpen, &ClientSessionManager::_nothing, SoftLimit},
+    {SessionEvent::MaxTime, kAtSoftLimit, &ClientSessionManager::_endMaxTime, None},
+    {SessionEvent::ExternalFlush, kAnyState, &ClientSessionManager::_endExternal, None},
+    {SessionEvent::MemoryWarning, kAnyState, &ClientSessionManager::_requestFlush, {}},
+    {SessionEvent::CriticalMemory, kAnyState, &ClientSessionManager::_endCriticalMemory, None},
+    {SessionEvent::MemoryNormal, kAnyState, &ClientSessionManager::_requestFlush, {}},
+    {SessionEvent::Idle, kAtSoftLimit, &ClientSessionManager::_endIdleAndBegin, Open},
+    {SessionEvent::GuidChanged, kInSession, &ClientSessionManager::_endGuidChangedAndBegin, Open},
+    {SessionEvent::Engagement, kAtSoftLimit, &ClientSessionManager::_endEngagement, None},
 };
 
 ClientSessionManager::ClientSessionManager(Assembly& assembly, std::shared_ptr<TavrinUserGUIDController> guidController,
@@ -156,9 +156,8 @@ void ClientSessionManager::_begin(Occasion& occasion)
 
 void ClientSessionManager::_endMaxTime(Occasion&)
 {
-    _flushSessionWithReason(SessionEndReason::MaxSessionTime, [this] {
-        log().log("session flushed because max timer expired {}", _identifier);
-    });
+    _flushSessionWithReason(SessionEndReason::MaxSessionTime,
+                            [this] { log().log("session flushed because max timer expired {}", _identifier); });
 }
 
 void ClientSessionManager::_endExternal(Occasion& occasion)
@@ -245,8 +244,8 @@ void ClientSessionManager::_flushSessionWithReason(SessionEndReason reason, std:
         std::exchange(_session, nullptr)->enumerateSessions([&](ClientSession& session, bool) {
             auto end = std::make_shared<TavrinSessionEndFeedback>(reason);
             end->timestamp = now;
-            session.addFeedback(std::make_shared<TavrinFeedback>(std::move(end), 0, session.userGuid().string(),
-                                                                 session.agent()));
+            session.addFeedback(
+                std::make_shared<TavrinFeedback>(std::move(end), 0, session.userGuid().string(), session.agent()));
             session.sessionComplete();
         });
     }

@@ -5,7 +5,7 @@
 #include <memory>
 #include <string>
 
-#include "platform/Date.h"
+#include "platform/base/Date.h"
 
 namespace platform {
 class Queue;

@@ -2,7 +2,7 @@
 
 #include <iterator>
 
-#include "platform/Device.h"
+#include "platform/device/Device.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/TavrinFeedback.h"
 

@@ -7,10 +7,11 @@
 #include <string>
 
 #include "CoreTavrin/TAVProtocols.h"
-#include "platform/NotificationCenter.h"
-#include "platform/Queue.h"
-#include "platform/UrlSession.h"
-#include "platform/Uuid.h"
+#include "platform/base/Uuid.h"
+#include "platform/net/UrlSession.h"
+#include "platform/run/NotificationCenter.h"
+#include "platform/run/Queue.h"
+#include "platform/values/Json.h"
 
 namespace platform {
 class JsonDocument;

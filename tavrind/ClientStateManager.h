@@ -6,8 +6,8 @@
 #include <string>
 
 #include "CoreTavrin/TAVProtocols.h"
-#include "platform/Bytes.h"
-#include "platform/UrlSession.h"
+#include "platform/base/Bytes.h"
+#include "platform/net/UrlSession.h"
 #include "tavrind/ImageFetches.h"
 
 namespace platform {
@@ -28,8 +28,8 @@ class ClientState;
 ///
 /// Images are fetched from where they say themselves and from where the bag says by their identifiers, 24 at once, each
 /// of 10 MiB at most (ClientStateManagerImages.cpp). Those of an answer are fetched ahead, and nobody waits for them;
-/// those that a client asks for go before them. What the cache holds isn't fetched, and what is on its way isn't fetched
-/// twice.
+/// those that a client asks for go before them. What the cache holds isn't fetched, and what is on its way isn't
+/// fetched twice.
 ///
 /// `loadImages` must be called from a task of a serial queue (the connection's), which is held back while it waits.
 /// Everything else: any thread.

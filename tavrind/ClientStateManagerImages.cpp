@@ -1,7 +1,5 @@
 // The images of answers: fetched ahead into the HTTP cache, and handed to clients.
 
-#include "tavrind/ClientStateManager.h"
-
 #include <algorithm>
 
 #include <fmt/format.h>
@@ -9,14 +7,16 @@
 #include "CoreTavrin/ResponseImages.h"
 #include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVError.h"
-#include "platform/Clock.h"
-#include "platform/Device.h"
-#include "platform/HttpCache.h"
-#include "platform/Queue.h"
-#include "platform/Transactions.h"
+#include "platform/device/Device.h"
+#include "platform/net/HttpCache.h"
+#include "platform/run/Clock.h"
+#include "platform/run/Queue.h"
+#include "platform/run/Transactions.h"
+#include "platform/values/Dictionary.h"
 #include "searchrecords/ZRNetworkFeedback.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/ClientSessionManager.h"
+#include "tavrind/ClientStateManager.h"
 #include "tavrind/FeedbackRecords.h"
 #include "tavrind/mmap_file.h"
 #include "tavrind/TavrinBagController.h"

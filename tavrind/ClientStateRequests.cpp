@@ -1,8 +1,6 @@
 // The road of a client's request: bag, skip rules, cache, service, reply, feedback. Search takes every step; the other
 // kinds leave some out.
 
-#include "tavrind/ClientState.h"
-
 #include <fmt/format.h>
 
 #include "CoreTavrin/ClientVocabulary.h"
@@ -12,14 +10,16 @@
 #include "CoreTavrin/TAVReply.h"
 #include "CoreTavrin/TAVRequest.h"
 #include "CoreTavrin/TAVSessionConfiguration.h"
-#include "platform/Clock.h"
-#include "platform/Device.h"
-#include "platform/JsonDocument.h"
-#include "platform/Text.h"
+#include "platform/device/Device.h"
+#include "platform/run/Clock.h"
+#include "platform/text/Text.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "searchrecords/ZRErrorFeedback.h"
 #include "searchrecords/ZRNetworkFeedback.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/ClientSessionManager.h"
+#include "tavrind/ClientState.h"
 #include "tavrind/ClientStateManager.h"
 #include "tavrind/FeedbackRecords.h"
 #include "tavrind/QueryCache.h"

@@ -10,8 +10,8 @@ struct z_stream_s;
 
 namespace tavrin {
 
-/// Compresses what is written (raw DEFLATE, RFC 1951, without a header) into another stream, and digests it (SHA-512) as
-/// it was before. An error of the other stream is this stream's. One thread at a time.
+/// Compresses what is written (raw DEFLATE, RFC 1951, without a header) into another stream, and digests it (SHA-512)
+/// as it was before. An error of the other stream is this stream's. One thread at a time.
 class CompressedOutputStream final : public OutputStream {
 public:
     /// Into memory.

@@ -3,9 +3,9 @@
 #include <algorithm>
 #include <random>
 
-#include "platform/Text.h"
-#include "platform/Url.h"
-#include "platform/UrlScheme.h"
+#include "platform/net/Url.h"
+#include "platform/net/UrlScheme.h"
+#include "platform/text/Text.h"
 
 namespace tavrin {
 

@@ -7,7 +7,7 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/AppActivities.h"
+#include "platform/device/AppActivities.h"
 
 namespace tavrin {
 

@@ -5,8 +5,9 @@
 
 #include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVError.h"
-#include "platform/Device.h"
-#include "platform/UserDefaults.h"
+#include "platform/device/Device.h"
+#include "platform/files/UserDefaults.h"
+#include "platform/values/Dictionary.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/TAVNetworkRequestFactory.h"
 #include "tavrind/TavrinBagController.h"

@@ -7,10 +7,11 @@
 #include <optional>
 #include <string>
 
-#include "platform/BackgroundSession.h"
-#include "platform/Files.h"
-#include "platform/NotificationCenter.h"
-#include "platform/Value.h"
+#include "platform/files/Files.h"
+#include "platform/net/BackgroundSession.h"
+#include "platform/run/NotificationCenter.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Value.h"
 #include "tavrind/DownloadResource.h"
 
 namespace platform {

@@ -3,6 +3,7 @@
 #include <algorithm>
 
 #include "CoreTavrin/TAVBag.h"
+#include "platform/values/Dictionary.h"
 
 namespace tavrin {
 

@@ -5,8 +5,8 @@
 #include <string>
 #include <string_view>
 
-#include "platform/Url.h"
-#include "platform/Value.h"
+#include "platform/net/Url.h"
+#include "platform/values/Value.h"
 
 namespace tavrin {
 

@@ -5,10 +5,12 @@
 #include <string_view>
 #include <utility>
 
-#include "platform/Error.h"
-#include "platform/Files.h"
-#include "platform/Queue.h"
-#include "platform/Uuid.h"
+#include "platform/base/Uuid.h"
+#include "platform/files/Files.h"
+#include "platform/run/Queue.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Error.h"
+#include "platform/values/Json.h"
 #include "tavrind/TavrinLogging.h"
 
 namespace tavrin {
@@ -22,10 +24,9 @@ constexpr std::size_t kMaximumFileSize = 64 * 1024;
 
 /// By fate. From kFirstDropped on they are reasons of a drop.
 constexpr std::array<std::string_view, kFeedbackFates> kNames{
-    "open",           "closed",        "uploading",    "sent",         "notSent",   "unknown",
-    "feedbackOff",    "noContainer",   "refusedAppend", "fileTooBig",  "tooOld",    "unreadable",
-    "otherVersion",   "damagedTail",   "notJson",      "noBody",       "noTask",    "endpointUnset",
-    "bufferFull",
+    "open",        "closed",        "uploading",  "sent",          "notSent",    "unknown",      "feedbackOff",
+    "noContainer", "refusedAppend", "fileTooBig", "tooOld",        "unreadable", "otherVersion", "damagedTail",
+    "notJson",     "noBody",        "noTask",     "endpointUnset", "bufferFull",
 };
 constexpr auto kFirstDropped = static_cast<std::size_t>(FeedbackFate::FeedbackOff);
 
@@ -57,7 +58,8 @@ void FeedbackBooks::_load()
 
     for (std::size_t fate = 0; fate < kFeedbackFates; ++fate) {
         const Value& group = fate < kFirstDropped ? *books : (*books)["dropped"];
-        const std::int64_t events = std::clamp<std::int64_t>(group[kNames[fate]].asInt().value_or(0), 0, INT64_MAX / 64);
+        const std::int64_t events =
+            std::clamp<std::int64_t>(group[kNames[fate]].asInt().value_or(0), 0, INT64_MAX / 64);
         _recorded += events;
         _counts[fate] = events;
     }

@@ -7,7 +7,7 @@
 #include <mutex>
 #include <string>
 
-#include "platform/Value.h"
+#include "platform/values/Value.h"
 
 namespace platform {
 class FileSystem;
@@ -46,9 +46,10 @@ inline constexpr std::size_t kFeedbackFates = static_cast<std::size_t>(FeedbackF
 ///
 /// They outlive the process. They are saved where events change hands between files (a session is closed, read,
 /// uploaded), not with every event. A new process takes all that was under way for unknown, and moves to their places
-/// the events that it finds again in session files and unfinished uploads; what it finds beyond the books, written after
-/// they were last saved, it books as recorded. It can't tell one event from another: one that was written since then
-/// takes the place of one that is gone, and an upload that is reported again after a kill is booked again. Any thread.
+/// the events that it finds again in session files and unfinished uploads; what it finds beyond the books, written
+/// after they were last saved, it books as recorded. It can't tell one event from another: one that was written since
+/// then takes the place of one that is gone, and an upload that is reported again after a kill is booked again. Any
+/// thread.
 class FeedbackBooks {
 public:
     /// Reads `path`; a damaged file is logged, and the books begin anew.

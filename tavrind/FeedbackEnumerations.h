@@ -4,7 +4,7 @@
 #include <span>
 #include <type_traits>
 
-#include "platform/Value.h"
+#include "platform/values/Value.h"
 #include "searchrecords/ZREnums.h"
 
 /// The strings that stand for the values of the records' enumerations in uploads. They are format. Any thread.

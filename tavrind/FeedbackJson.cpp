@@ -1,6 +1,7 @@
 #include "tavrind/FeedbackJson.h"
 
 #include "CoreTavrin/TAVFeedback.h"
+#include "platform/values/Dictionary.h"
 #include "searchrecords/ZRRecords.h"
 #include "tavrind/FeedbackEnumerations.h"
 #include "tavrind/FeedbackTypes.h"

@@ -3,7 +3,8 @@
 #include <cstdint>
 #include <string>
 
-#include "platform/Value.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Value.h"
 
 namespace platform {
 struct Error;

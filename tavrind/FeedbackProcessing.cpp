@@ -85,10 +85,8 @@ void process(ZRFeedback& record, SessionProcessingHelper& helper)
         return processor.showAll(as<ZRRankingFeedback>(record).sections);
     case EventType::ResultsReceivedAfterTimeout:
         return processor.showAll(as<ZRResultsReceivedAfterTimeoutFeedback>(record).results);
-    case EventType::LateSectionsAppended:
-        return processor.showAll(as<ZRLateSectionsAppendedFeedback>(record).sections);
-    case EventType::VisibleSuggestions:
-        return processor.showAll(as<ZRVisibleSuggestionsFeedback>(record).suggestions);
+    case EventType::LateSectionsAppended: return processor.showAll(as<ZRLateSectionsAppendedFeedback>(record).sections);
+    case EventType::VisibleSuggestions: return processor.showAll(as<ZRVisibleSuggestionsFeedback>(record).suggestions);
     case EventType::ResultEngagement: return processor.refer(as<ZRResultEngagementFeedback>(record).result);
     case EventType::SuggestionEngagement: return processor.refer(as<ZRSuggestionEngagementFeedback>(record).suggestion);
     case EventType::Unknown: // parts of a ranking, each on its own

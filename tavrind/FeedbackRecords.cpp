@@ -2,6 +2,8 @@
 
 #include <algorithm>
 
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "searchrecords/ZRNetworkFeedback.h"
 
 namespace tavrin {

@@ -3,8 +3,8 @@
 #include <memory>
 #include <string>
 
-#include "platform/Url.h"
-#include "platform/UrlSession.h"
+#include "platform/net/Url.h"
+#include "platform/net/UrlSession.h"
 #include "searchrecords/ZREnums.h"
 
 namespace tavrin {

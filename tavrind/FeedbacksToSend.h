@@ -4,7 +4,8 @@
 #include <functional>
 #include <optional>
 
-#include "platform/Value.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Value.h"
 
 namespace tavrin {
 

@@ -6,9 +6,10 @@
 #include <exception>
 #include <unistd.h>
 
-#include "platform/Files.h"
-#include "platform/Queue.h"
-#include "platform/Transactions.h"
+#include "platform/files/Files.h"
+#include "platform/run/Queue.h"
+#include "platform/run/Transactions.h"
+#include "platform/values/Archive.h"
 #include "tavrind/ArchivedDataIterator.h"
 #include "tavrind/ClientSessionHeader.h"
 #include "tavrind/FeedbackBooks.h"

@@ -6,7 +6,7 @@
 #include <memory>
 #include <string>
 
-#include "platform/Value.h"
+#include "platform/values/Value.h"
 
 namespace platform {
 class AppendFile;

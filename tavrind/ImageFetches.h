@@ -8,8 +8,8 @@
 #include <unordered_map>
 #include <vector>
 
-#include "platform/Date.h"
-#include "platform/Url.h"
+#include "platform/base/Date.h"
+#include "platform/net/Url.h"
 
 namespace tavrin {
 

@@ -9,10 +9,12 @@
 
 #include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVRequest.h"
-#include "platform/DataDetectorStore.h"
-#include "platform/Device.h"
-#include "platform/Text.h"
-#include "platform/UserDefaults.h"
+#include "platform/device/DataDetectorStore.h"
+#include "platform/device/Device.h"
+#include "platform/files/UserDefaults.h"
+#include "platform/text/Text.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/TavrinLogging.h"
 

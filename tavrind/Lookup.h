@@ -4,7 +4,8 @@
 #include <optional>
 #include <string>
 
-#include "platform/NotificationCenter.h"
+#include "platform/run/NotificationCenter.h"
+#include "platform/values/Dictionary.h"
 #include "tavrind/DownloadManager.h"
 
 namespace platform {

@@ -9,6 +9,8 @@
 
 #include <fmt/format.h>
 
+#include "platform/values/Dictionary.h"
+
 namespace tavrin {
 
 namespace {

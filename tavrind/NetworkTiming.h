@@ -3,7 +3,8 @@
 #include <optional>
 #include <string>
 
-#include "platform/Value.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Value.h"
 
 /// Timing data of a finished task (docs/timing.md) in the form that is uploaded.
 namespace tavrin {

@@ -1,6 +1,6 @@
 #include "tavrind/OutputStream.h"
 
-#include "platform/Files.h"
+#include "platform/files/Files.h"
 
 namespace tavrin {
 

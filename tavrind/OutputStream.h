@@ -6,7 +6,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/Error.h"
+#include "platform/values/Error.h"
 
 namespace platform {
 class AppendFile;

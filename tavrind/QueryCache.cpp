@@ -3,9 +3,9 @@
 #include <fmt/format.h>
 
 #include "CoreTavrin/TAVRequest.h"
-#include "platform/Clock.h"
-#include "platform/Device.h"
-#include "platform/Text.h"
+#include "platform/device/Device.h"
+#include "platform/run/Clock.h"
+#include "platform/text/Text.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/TAVNetworkRequestFactory.h"
 #include "tavrind/TavrinLogging.h"

@@ -5,8 +5,8 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/MemoryPressure.h"
-#include "platform/NotificationCenter.h"
+#include "platform/device/MemoryPressure.h"
+#include "platform/run/NotificationCenter.h"
 #include "tavrind/CachedResultSet.h"
 #include "tavrind/CritbitTree.h"
 

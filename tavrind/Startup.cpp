@@ -3,12 +3,12 @@
 #include <cstdlib>
 
 #include "CoreTavrin/TAVProtocols.h"
-#include "platform/BackgroundSession.h"
-#include "platform/Device.h"
-#include "platform/Log.h"
-#include "platform/NotificationCenter.h"
-#include "platform/UrlSession.h"
-#include "platform/UserDefaults.h"
+#include "platform/base/Log.h"
+#include "platform/device/Device.h"
+#include "platform/files/UserDefaults.h"
+#include "platform/net/BackgroundSession.h"
+#include "platform/net/UrlSession.h"
+#include "platform/run/NotificationCenter.h"
 #include "tavrind/AppWhitelistController.h"
 #include "tavrind/BackgroundActivitiesManager.h"
 #include "tavrind/ClientStateManager.h"

@@ -2,7 +2,7 @@
 
 #include <memory>
 
-#include "platform/Error.h"
+#include "platform/values/Error.h"
 #include "tavrind/Assembly.h"
 
 namespace platform {

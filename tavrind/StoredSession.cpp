@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <utility>
 
+#include "platform/values/Dictionary.h"
 #include "tavrind/SessionProcessingHelper.h"
 #include "tavrind/TavrinFeedback.h"
 #include "tavrind/TavrinSessionFeedback.h"
@@ -68,9 +69,8 @@ private:
 
 void sortByTimestamp(Feedbacks& feedbacks)
 {
-    std::ranges::stable_sort(feedbacks, [](const auto& a, const auto& b) {
-        return TavrinFeedback::timeStampComparator(*a, *b) < 0;
-    });
+    std::ranges::stable_sort(
+        feedbacks, [](const auto& a, const auto& b) { return TavrinFeedback::timeStampComparator(*a, *b) < 0; });
 }
 
 StoredSession::StoredSession(ClientSessionHeader header, Feedbacks feedbacks)
@@ -86,18 +86,15 @@ FeedbacksToSend StoredSession::getFeedbacksToSend()
     auto events = std::make_unique<UploadedEvents>(std::move(feedbacks), _header);
     FeedbacksToSend upload{.nextEvent = [events = std::move(events)] { return events->next(); }};
 
-    Dictionary rest{{"agent", _header.agent},
-                    {"user_guid", _header.userGuid.isNil() ? "" : _header.userGuid.string()}};
+    Dictionary rest{{"agent", _header.agent}, {"user_guid", _header.userGuid.isNil() ? "" : _header.userGuid.string()}};
     // The list ends at what is missing.
     if (_header.resourceVersions.asDictionary()) {
         rest.set("resource_versions", _header.resourceVersions);
         rest.set("first_use", _header.firstUse);
         const bool hidden = _header.removeTimestamps || !_header.baseTime;
-        rest.set("base_time",
-                 hidden ? 0 : static_cast<std::int64_t>(platform::secondsSince1970(*_header.baseTime)));
-        rest.set("previous_session_end_reason",
-                 TavrinSessionEndFeedback::triggerEventEnumToString(
-                     static_cast<SessionEndReason>(_header.previousSessionEndReason)));
+        rest.set("base_time", hidden ? 0 : static_cast<std::int64_t>(platform::secondsSince1970(*_header.baseTime)));
+        rest.set("previous_session_end_reason", TavrinSessionEndFeedback::triggerEventEnumToString(
+                                                    static_cast<SessionEndReason>(_header.previousSessionEndReason)));
     }
     upload.rest = std::move(rest);
     return upload;

@@ -7,10 +7,10 @@
 #include <string>
 #include <vector>
 
-#include "platform/LocationSource.h"
-#include "platform/NotificationCenter.h"
-#include "platform/UrlSession.h"
-#include "platform/Uuid.h"
+#include "platform/base/Uuid.h"
+#include "platform/device/LocationSource.h"
+#include "platform/net/UrlSession.h"
+#include "platform/run/NotificationCenter.h"
 #include "tavrind/TavrinSubscriptionManager.h"
 
 namespace platform {

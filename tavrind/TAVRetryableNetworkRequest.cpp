@@ -1,7 +1,7 @@
 #include "tavrind/TAVRetryableNetworkRequest.h"
 
-#include "platform/Clock.h"
-#include "platform/Device.h"
+#include "platform/device/Device.h"
+#include "platform/run/Clock.h"
 
 namespace tavrin {
 namespace {

@@ -5,7 +5,7 @@
 #include <memory>
 #include <optional>
 
-#include "platform/UrlSession.h"
+#include "platform/net/UrlSession.h"
 
 namespace platform {
 struct Device;

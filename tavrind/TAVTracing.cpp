@@ -2,9 +2,9 @@
 
 #include <mutex>
 
-#include "platform/Log.h"
-#include "platform/Trace.h"
-#include "platform/UserDefaults.h"
+#include "platform/base/Log.h"
+#include "platform/base/Trace.h"
+#include "platform/files/UserDefaults.h"
 
 namespace tavrin {
 

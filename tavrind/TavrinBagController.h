@@ -6,9 +6,9 @@
 #include <optional>
 #include <string>
 
-#include "platform/Error.h"
-#include "platform/NotificationCenter.h"
-#include "platform/Url.h"
+#include "platform/net/Url.h"
+#include "platform/run/NotificationCenter.h"
+#include "platform/values/Error.h"
 
 namespace platform {
 class Queue;

@@ -4,7 +4,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/Date.h"
+#include "platform/base/Date.h"
 #include "tavrind/DeepLinks.h"
 
 namespace tavrin {

@@ -2,8 +2,8 @@
 
 #include <algorithm>
 
-#include "platform/Device.h"
-#include "platform/Queue.h"
+#include "platform/device/Device.h"
+#include "platform/run/Queue.h"
 #include "tavrind/Assembly.h"
 
 namespace tavrin {

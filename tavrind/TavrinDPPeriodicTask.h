@@ -5,7 +5,7 @@
 #include <memory>
 #include <string>
 
-#include "platform/ActivityScheduler.h"
+#include "platform/device/ActivityScheduler.h"
 
 namespace platform {
 class Queue;

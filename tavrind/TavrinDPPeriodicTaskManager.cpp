@@ -1,8 +1,8 @@
 #include "tavrind/TavrinDPPeriodicTaskManager.h"
 
-#include "platform/Device.h"
-#include "platform/Queue.h"
-#include "platform/Transactions.h"
+#include "platform/device/Device.h"
+#include "platform/run/Queue.h"
+#include "platform/run/Transactions.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/TavrinDPPeriodicTask.h"
 #include "tavrind/TavrinLogging.h"

@@ -2,7 +2,7 @@
 
 #include <fmt/format.h>
 
-#include "platform/Counters.h"
+#include "platform/files/Counters.h"
 
 namespace tavrin {
 

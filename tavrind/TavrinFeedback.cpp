@@ -1,6 +1,8 @@
 #include "tavrind/TavrinFeedback.h"
 
 #include "CoreTavrin/TAVRecordClasses.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "tavrind/FeedbackJson.h"
 #include "tavrind/FeedbackProcessing.h"
 #include "tavrind/FeedbackTypes.h"

@@ -5,6 +5,7 @@
 #include <memory>
 #include <string>
 
+#include "platform/values/Dictionary.h"
 #include "searchrecords/ZRFeedback.h"
 
 namespace tavrin {
@@ -27,10 +28,10 @@ struct TavrinFeedback : platform::RecordOf<TavrinFeedback> {
 
     /// The client's record, or one of the daemon's own. Null only where an archive lacks it.
     std::shared_ptr<ZRFeedback> feedback;
-    std::int64_t queryId = 0;        ///< the daemon's query that the event belongs to
-    std::uint64_t relTimestamp = 0;  ///< milliseconds after the first event; set as the session hands its events out
-    std::string userGuid;            ///< in force when the event was recorded; empty before the session fills it in
-    std::string userAgent;           ///< the client's
+    std::int64_t queryId = 0;       ///< the daemon's query that the event belongs to
+    std::uint64_t relTimestamp = 0; ///< milliseconds after the first event; set as the session hands its events out
+    std::string userGuid;           ///< in force when the event was recorded; empty before the session fills it in
+    std::string userAgent;          ///< the client's
     /// The call that reported the event, answered when the last copy of this goes; null for most. Not stored.
     std::shared_ptr<void> call;
     std::uint64_t clientQueryId = 0; ///< the client's own query id; 0 is none

@@ -3,12 +3,14 @@
 #include <cerrno>
 
 #include "CoreTavrin/TAVBag.h"
-#include "platform/BackgroundSession.h"
-#include "platform/Device.h"
-#include "platform/Files.h"
-#include "platform/Queue.h"
-#include "platform/Text.h"
-#include "platform/Uuid.h"
+#include "platform/base/Uuid.h"
+#include "platform/device/Device.h"
+#include "platform/files/Files.h"
+#include "platform/net/BackgroundSession.h"
+#include "platform/run/Queue.h"
+#include "platform/text/Text.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "searchrecords/ZRViewFeedback.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/CompressedOutputStream.h"
@@ -51,9 +53,8 @@ private:
 };
 
 /// A new file of an unguessed name, open.
-platform::Result<std::unique_ptr<platform::AppendFile>> makeTemporaryFile(platform::FileSystem& files,
-                                                                          const std::filesystem::path& directory,
-                                                                          std::filesystem::path& path)
+platform::Result<std::unique_ptr<platform::AppendFile>>
+makeTemporaryFile(platform::FileSystem& files, const std::filesystem::path& directory, std::filesystem::path& path)
 {
     for (int attempt = 0;; ++attempt) {
         path = directory / ("flusher_" + platform::Uuid::random().string().substr(0, 6));
@@ -119,7 +120,8 @@ std::shared_ptr<TavrinFeedbackFlusher> TavrinFeedbackFlusher::make(Assembly& ass
 
 TavrinFeedbackFlusher::TavrinFeedbackFlusher(Assembly& assembly, std::int64_t identifier)
     : _assembly(assembly), _identifier(identifier),
-      _queueBuffer(assembly.device.serialQueue("com.quorvane.tavrind.tavrinDataBufferQueue", platform::Priority::Background)),
+      _queueBuffer(
+          assembly.device.serialQueue("com.quorvane.tavrind.tavrinDataBufferQueue", platform::Priority::Background)),
       _feedbackCountQueue(assembly.device.serialQueue("com.quorvane.tavrind.feedbackCountQueue"))
 {
     log().log("Initialize flusher for {}", convertIdentifierToString(identifier));
@@ -129,31 +131,31 @@ TavrinFeedbackFlusher::~TavrinFeedbackFlusher() = default;
 
 void TavrinFeedbackFlusher::flush(std::shared_ptr<Flushable> object, std::move_only_function<void()> callback)
 {
-    _queueBuffer->async([self = shared_from_this(), object = std::move(object),
-                         callback = std::move(callback)]() mutable {
-        self->_sessionBuffer.push_back(std::move(object));
-        if (callback) callback();
-    });
+    _queueBuffer->async(
+        [self = shared_from_this(), object = std::move(object), callback = std::move(callback)]() mutable {
+            self->_sessionBuffer.push_back(std::move(object));
+            if (callback) callback();
+        });
 }
 
 void TavrinFeedbackFlusher::flush(std::shared_ptr<ZRCustomFeedback> record, std::move_only_function<void()> callback)
 {
-    _queueBuffer->async([self = shared_from_this(), record = std::move(record),
-                         callback = std::move(callback)]() mutable {
-        const std::size_t size = platform::jsonSize(record->jsonFeedback);
-        const bool full =
-            self->_recordsBuffered == kMaximumRecords || size > kMaximumRecordBytes - self->_recordBytesBuffered;
-        if (full) {
-            log().error("{} records of {} bytes wait already, dropping one of {} bytes", self->_recordsBuffered,
-                        self->_recordBytesBuffered, size);
-        } else {
-            ++self->_recordsBuffered;
-            self->_recordBytesBuffered += size;
-            self->_sessionBuffer.push_back(std::make_shared<CustomFeedbackToSend>(std::move(record)));
-        }
-        self->_assembly.feedbackBooks.record(full ? FeedbackFate::BufferFull : FeedbackFate::Open);
-        if (callback) callback();
-    });
+    _queueBuffer->async(
+        [self = shared_from_this(), record = std::move(record), callback = std::move(callback)]() mutable {
+            const std::size_t size = platform::jsonSize(record->jsonFeedback);
+            const bool full =
+                self->_recordsBuffered == kMaximumRecords || size > kMaximumRecordBytes - self->_recordBytesBuffered;
+            if (full) {
+                log().error("{} records of {} bytes wait already, dropping one of {} bytes", self->_recordsBuffered,
+                            self->_recordBytesBuffered, size);
+            } else {
+                ++self->_recordsBuffered;
+                self->_recordBytesBuffered += size;
+                self->_sessionBuffer.push_back(std::make_shared<CustomFeedbackToSend>(std::move(record)));
+            }
+            self->_assembly.feedbackBooks.record(full ? FeedbackFate::BufferFull : FeedbackFate::Open);
+            if (callback) callback();
+        });
 }
 
 void TavrinFeedbackFlusher::flushSyncFromArray(std::vector<std::shared_ptr<Flushable>> objects)
@@ -193,8 +195,7 @@ TavrinFeedbackFlusher::Bodies TavrinFeedbackFlusher::flushToWireWithObjectsRetur
 {
     _queueBuffer->assertOnQueue();
     log().info("Sessions Flushed {}", _sessionBuffer.size());
-    if (!_serverEndpoint)
-        log().error("Server endpoint not set, data can't be sent to server");
+    if (!_serverEndpoint) log().error("Server endpoint not set, data can't be sent to server");
     Bodies bodies;
     _recordsBuffered = _recordBytesBuffered = 0;
     for (const auto& object : std::exchange(_sessionBuffer, {})) _flushObject(*object, returned ? &bodies : nullptr);
@@ -259,10 +260,8 @@ void TavrinFeedbackFlusher::_upload(const std::filesystem::path& fpath, const st
         return _assembly.feedbackBooks.move(FeedbackFate::Open, FeedbackFate::NoTask, events);
     }
     const auto feedbacks = static_cast<std::int64_t>(count);
-    (*task)->setNote(UploadNote{.flusher = _identifier,
-                                .feedbacks = feedbacks,
-                                .events = events,
-                                .process = _assembly.feedbackBooks.process()}
+    (*task)->setNote(UploadNote{
+        .flusher = _identifier, .feedbacks = feedbacks, .events = events, .process = _assembly.feedbackBooks.process()}
                          .value());
     setFeedbacksPerTask(**task, feedbacks);
     _assembly.feedbackBooks.move(FeedbackFate::Open, FeedbackFate::Uploading, events);

@@ -10,9 +10,9 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/Bytes.h"
-#include "platform/NotificationCenter.h"
-#include "platform/Url.h"
+#include "platform/base/Bytes.h"
+#include "platform/net/Url.h"
+#include "platform/run/NotificationCenter.h"
 #include "tavrind/FeedbacksToSend.h"
 
 namespace platform {

@@ -2,8 +2,8 @@
 
 #include <utility>
 
-#include "platform/Device.h"
-#include "platform/Queue.h"
+#include "platform/device/Device.h"
+#include "platform/run/Queue.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/BackgroundActivitiesManager.h"
 #include "tavrind/ClientConnection.h"
@@ -142,7 +142,7 @@ void TavrinFlusherXPC::_dump(const Tool& tool)
     }
 }
 
-TavrinFlusherXPC::Tool TavrinFlusherXPC::_holderOf(Tool TavrinFlusherXPC::*role) const
+TavrinFlusherXPC::Tool TavrinFlusherXPC::_holderOf(Tool TavrinFlusherXPC::* role) const
 {
     return _queue->sync([&] { return this->*role; });
 }

@@ -45,7 +45,7 @@ private:
     void _accept(const std::shared_ptr<platform::ipc::Connection>& connection);
     void _removeDelegate(const Tool& tool);
     void _dump(const Tool& tool);
-    [[nodiscard]] Tool _holderOf(Tool TavrinFlusherXPC::*role) const;
+    [[nodiscard]] Tool _holderOf(Tool TavrinFlusherXPC::* role) const;
 
     Assembly& _assembly;
     GetClientConnections _getClientConnections;

@@ -4,9 +4,9 @@
 #include <cerrno>
 #include <charconv>
 
-#include "platform/Clock.h"
-#include "platform/Device.h"
-#include "platform/UserDefaults.h"
+#include "platform/device/Device.h"
+#include "platform/files/UserDefaults.h"
+#include "platform/run/Clock.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/ClientSessionManager.h"
 #include "tavrind/FeedbackBooks.h"
@@ -43,7 +43,8 @@ std::optional<std::int32_t> sessionNumber(std::string_view fileName)
 {
     if (!fileName.starts_with(kPrefix)) return std::nullopt;
     const std::string_view digits = fileName.substr(kPrefix.size());
-    if (digits.empty() || !std::ranges::all_of(digits, [](char c) { return c >= '0' && c <= '9'; })) return std::nullopt;
+    if (digits.empty() || !std::ranges::all_of(digits, [](char c) { return c >= '0' && c <= '9'; }))
+        return std::nullopt;
     std::int32_t number = 0;
     const auto [end, error] = std::from_chars(digits.data(), digits.data() + digits.size(), number);
     if (error != std::errc() || number > INT32_MAX / 2) return std::nullopt;
@@ -141,7 +142,8 @@ std::shared_ptr<FileContainer> TavrinPersistentStorage::createFileContainerForWr
 std::vector<std::shared_ptr<FileContainer>> TavrinPersistentStorage::getAvailableSessionHandles()
 {
     return _queue->sync([this] {
-        for (const auto& container : _fileContainers) log().debug("available file url {}", container->fileUrl().string());
+        for (const auto& container : _fileContainers)
+            log().debug("available file url {}", container->fileUrl().string());
         return _fileContainers;
     });
 }
@@ -161,7 +163,8 @@ void TavrinPersistentStorage::deleteSessionWithFileContainer(std::shared_ptr<Fil
         self->_fileCount -= static_cast<int>(std::erase(self->_fileContainers, container));
         container->closeFile();
         const fs::path& fileUrl = container->fileUrl();
-        if (fileUrl.empty()) return log().error("Handle {} does not have a File URL", static_cast<const void*>(container.get()));
+        if (fileUrl.empty())
+            return log().error("Handle {} does not have a File URL", static_cast<const void*>(container.get()));
         log().debug("delete file url {}", fileUrl.string());
         if (const auto removed = self->_assembly.fileManager.remove(fileUrl); !removed)
             log().error("File {} delete failed", fileUrl.string());

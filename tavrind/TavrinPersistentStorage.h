@@ -55,7 +55,7 @@ private:
     std::shared_ptr<const FileContainerStore> _store;
     double _maxFileAge = 0; ///< seconds
     std::atomic<std::int32_t> _handleId = 0;
-    std::atomic<int> _fileCount = 0; ///< session files, open and listed
+    std::atomic<int> _fileCount = 0;                             ///< session files, open and listed
     std::vector<std::shared_ptr<FileContainer>> _fileContainers; // on _queue
 };
 

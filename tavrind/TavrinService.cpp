@@ -4,12 +4,13 @@
 #include <unistd.h>
 
 #include "CoreTavrin/TAVBag.h"
-#include "platform/Clock.h"
-#include "platform/Counters.h"
-#include "platform/Device.h"
-#include "platform/Process.h"
-#include "platform/Transactions.h"
-#include "platform/UserDefaults.h"
+#include "platform/device/Device.h"
+#include "platform/device/ProcessIdentity.h"
+#include "platform/files/Counters.h"
+#include "platform/files/UserDefaults.h"
+#include "platform/run/Clock.h"
+#include "platform/run/Transactions.h"
+#include "platform/values/Dictionary.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/ClientConnection.h"
 #include "tavrind/ClientSessionManager.h"
@@ -155,7 +156,7 @@ Value TavrinService::status()
 
 std::string TavrinService::statistics()
 {
-    return _assembly.device.counters.openMetrics();
+    return _assembly.device.counters.openMetrics("tavrind_counter");
 }
 
 } // namespace tavrin

@@ -4,7 +4,9 @@
 #include <charconv>
 #include <cmath>
 
-#include "platform/Text.h"
+#include "platform/text/Text.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "tavrind/TavrinLogging.h"
 
 namespace tavrin {

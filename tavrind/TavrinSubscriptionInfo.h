@@ -4,8 +4,9 @@
 #include <string>
 #include <string_view>
 
-#include "platform/Date.h"
-#include "platform/Value.h"
+#include "platform/base/Date.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Value.h"
 
 namespace tavrin {
 

@@ -1,9 +1,9 @@
 #include "tavrind/TavrinSubscriptionManager.h"
 
 #include "CoreTavrin/TAVBag.h"
-#include "platform/Device.h"
-#include "platform/DeviceProfile.h"
-#include "platform/SubscriptionServices.h"
+#include "platform/device/Device.h"
+#include "platform/device/DeviceProfile.h"
+#include "platform/device/SubscriptionServices.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/TavrinBagController.h"
 #include "tavrind/TavrinLogging.h"

@@ -6,8 +6,8 @@
 #include <string>
 #include <vector>
 
-#include "platform/NotificationCenter.h"
-#include "platform/Value.h"
+#include "platform/run/NotificationCenter.h"
+#include "platform/values/Value.h"
 
 namespace platform {
 class Queue;

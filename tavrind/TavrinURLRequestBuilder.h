@@ -6,8 +6,8 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/Url.h"
-#include "platform/UrlSession.h"
+#include "platform/net/Url.h"
+#include "platform/net/UrlSession.h"
 
 namespace tavrin {
 

@@ -1,8 +1,8 @@
 #include "tavrind/TavrinUserGUIDController.h"
 
-#include "platform/Clock.h"
-#include "platform/Device.h"
-#include "platform/NotificationCenter.h"
+#include "platform/device/Device.h"
+#include "platform/run/Clock.h"
+#include "platform/run/NotificationCenter.h"
 #include "tavrind/Assembly.h"
 
 namespace tavrin {

@@ -2,8 +2,8 @@
 
 #include <memory>
 
-#include "platform/Date.h"
-#include "platform/Uuid.h"
+#include "platform/base/Date.h"
+#include "platform/base/Uuid.h"
 
 namespace platform {
 class Queue;

@@ -1,6 +1,6 @@
 #include "tavrind/TavrinXPCActivity.h"
 
-#include "platform/Device.h"
+#include "platform/device/Device.h"
 #include "tavrind/Assembly.h"
 
 namespace tavrin {

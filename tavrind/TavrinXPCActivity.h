@@ -4,7 +4,7 @@
 #include <memory>
 #include <string>
 
-#include "platform/ActivityScheduler.h"
+#include "platform/device/ActivityScheduler.h"
 
 namespace tavrin {
 
@@ -19,7 +19,10 @@ struct TavrinXPCCriteria {
     {
         criteria.gracePeriod = period;
     }
-    static void setAllowBatteryUsage(bool allow, platform::ActivityCriteria& criteria) { criteria.allowBattery = allow; }
+    static void setAllowBatteryUsage(bool allow, platform::ActivityCriteria& criteria)
+    {
+        criteria.allowBattery = allow;
+    }
     static void setInterval(std::chrono::seconds interval, platform::ActivityCriteria& criteria)
     {
         criteria.interval = interval;
@@ -29,8 +32,8 @@ struct TavrinXPCCriteria {
 /// The device's background activities, as this daemon uses them. Any thread.
 struct TavrinXPCActivity {
     using Handler = platform::ActivityScheduler::Handler;
-    static void registerActivity(Assembly& assembly, const std::string& identifier,
-                                 platform::ActivityCriteria criteria, Handler handler);
+    static void registerActivity(Assembly& assembly, const std::string& identifier, platform::ActivityCriteria criteria,
+                                 Handler handler);
     static void unregister(Assembly& assembly, const std::string& identifier);
     /// Whether the activity moved on.
     [[nodiscard]] static bool setState(platform::ActivityState state, platform::Activity& activity);

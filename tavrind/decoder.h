@@ -6,7 +6,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/Error.h"
+#include "platform/values/Error.h"
 
 // The reverse of encoder.h, as a service reads a signature. The daemon only writes them. Pure functions: any thread.
 

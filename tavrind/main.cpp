@@ -5,9 +5,10 @@
 #include <cstdlib>
 #include <unistd.h>
 
-#include "platform/Log.h"
-#include "platform/RunLoop.h"
-#include "platform/SystemDevice.h"
+#include "CoreTavrin/TAVProtocols.h"
+#include "platform/base/Log.h"
+#include "platform/device/SystemDevice.h"
+#include "platform/run/RunLoop.h"
 #include "tavrind/DaemonOptions.h"
 #include "tavrind/Startup.h"
 
@@ -20,7 +21,10 @@ int main(int argc, char** argv)
     platform::Log::threshold = options.logLevel;
 
     platform::RunLoop runLoop;
-    platform::SystemDevice device(runLoop, "com.quorvane.tavrind", "com.quorvane.lookup.shared");
+    platform::SystemDevice device(runLoop, {.service = "com.quorvane.tavrind",
+                                            .sharedSuite = "com.quorvane.lookup.shared",
+                                            .objectPath = std::string(tavrin::kObjectPath),
+                                            .notifyInterface = "com.quorvane.Notify"});
 
     auto daemon = tavrin::startUp(device.device());
     if (!daemon) {

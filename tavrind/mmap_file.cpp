@@ -8,7 +8,7 @@ namespace tavrin {
 
 platform::Result<platform::Bytes> mmapFileHandle(const platform::FileHandle& file)
 {
-    struct stat status {};
+    struct stat status{};
     if (fstat(file.fd(), &status) != 0) return std::unexpected(platform::Error::posix(errno));
     const auto size = static_cast<std::size_t>(status.st_size);
     void* address = mmap(nullptr, size, PROT_READ, MAP_PRIVATE, file.fd(), 0);

@@ -1,7 +1,7 @@
 #pragma once
 
-#include "platform/Bytes.h"
-#include "platform/Files.h"
+#include "platform/base/Bytes.h"
+#include "platform/files/Files.h"
 
 namespace tavrin {
 

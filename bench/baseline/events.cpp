@@ -1,5 +1,5 @@
-// A server on sd-bus that decodes the events it is sent and drops them: what events cost at least. One thread; the socket is
-// passed on as a service manager does.
+// A server on sd-bus that decodes the events it is sent and drops them: what events cost at least. One thread; the
+// socket is passed on as a service manager does.
 
 #include <cstdlib>
 #include <cstring>
@@ -9,15 +9,17 @@
 #include <systemd/sd-event.h>
 
 #include "CoreTavrin/TAVRecordClasses.h"
-#include "platform/BusMessage.h"
-#include "platform/Record.h"
+#include "platform/ipc/BusMessage.h"
+#include "platform/values/Record.h"
+#include "platform/values/ValueCoder.h"
 
 namespace {
 
 int onMessage(sd_bus_message* message, void*, sd_bus_error*)
 {
     if (!sd_bus_message_is_method_call(message, nullptr, nullptr)) return 0;
-    if (std::strcmp(sd_bus_message_get_member(message), "ReportEvent") != 0) return sd_bus_reply_method_return(message, "aa{sv}", 0);
+    if (std::strcmp(sd_bus_message_get_member(message), "ReportEvent") != 0)
+        return sd_bus_reply_method_return(message, "aa{sv}", 0);
     const auto decoded = platform::ipc::decodeArguments(message, 16u << 20);
     if (!decoded || !platform::recordFromValue(decoded->message.args.at(2), tavrin::coreRecordClasses())) std::abort();
     return 1;

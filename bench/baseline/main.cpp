@@ -3,11 +3,13 @@
 #include <memory>
 #include <vector>
 
-#include "platform/Ipc.h"
-#include "platform/RunLoop.h"
-#include "platform/SystemDevice.h"
-
-#include "platform/Clock.h"
+#include "platform/device/SystemDevice.h"
+#include "platform/ipc/BusTransport.h"
+#include "platform/ipc/Ipc.h"
+#include "platform/run/Clock.h"
+#include "platform/run/RunLoop.h"
+#include "platform/run/SystemClock.h"
+#include "platform/run/WorkerPool.h"
 
 int main()
 {
@@ -15,7 +17,8 @@ int main()
     platform::RunLoop loop;
     platform::WorkerPool pool;
     const auto clock = platform::makeSystemClock(loop);
-    const ipc::Interface interface{.name = "com.quorvane.TAVDaemonXPC",
+    const ipc::Interface interface{.path = "/com/quorvane/tavrind",
+                                   .name = "com.quorvane.TAVDaemonXPC",
                                    .methods = {{"ListSessions", "", "aa{sv}"}},
                                    .listenerName = "",
                                    .signals = {},

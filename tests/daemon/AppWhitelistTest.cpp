@@ -1,5 +1,3 @@
-#include <gtest/gtest.h>
-
 #include <array>
 #include <fstream>
 #include <random>
@@ -8,7 +6,10 @@
 #include <sys/mman.h>
 #include <unistd.h>
 
+#include <gtest/gtest.h>
+
 #include "CoreTavrin/TAVBag.h"
+#include "platform/values/Json.h"
 #include "tavrind/AppWhitelistController.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/decoder.h"

@@ -1,6 +1,7 @@
 #include <cmath>
 
 #include "CoreTavrin/TAVBag.h"
+#include "platform/values/PropertyList.h"
 #include "tavrind/TAVNetworkRequestFactory.h"
 #include "tavrind/TavrinBagController.h"
 #include "tests/support/DaemonFixture.h"
@@ -109,7 +110,9 @@ TEST_F(BagControllerTest, FailedFetchesLeaveTheOldBag)
         fault();
         device.drain();
         ASSERT_EQ(errors.size(), 1u);
-        if (reason) { EXPECT_EQ(errors[0], reason); }
+        if (reason) {
+            EXPECT_EQ(errors[0], reason);
+        }
         EXPECT_EQ(controller().inMemoryBag()->version(), "9");
     }
     EXPECT_EQ(device.files.files.at(kPath), onDisk);

@@ -1,3 +1,4 @@
+#include "platform/values/Dictionary.h"
 #include "searchrecords/ZRRecords.h"
 #include "searchrecords/ZRResultFeedback.h"
 #include "tavrind/ClientConnection.h"
@@ -54,11 +55,12 @@ TEST_F(ConnectionTest, AnInvalidConfigurationClosesTheConnection)
     const struct {
         Dictionary configuration;
         const char* text;
-    } cases[] = {{{}, "configuration must not be nil"},
-                 {named, "configuration requires identifier and agent"},
-                 {{{"class", "TAVSessionConfiguration"}, {"identifier", "id"}}, "configuration requires identifier and agent"},
-                 {{{"class", "TAVSessionConfiguration"}, {"identifier", ""}, {"userAgent", "A/1"}},
-                  "client session identifier cannot be nil or empty"}};
+    } cases[] = {
+        {{}, "configuration must not be nil"},
+        {named, "configuration requires identifier and agent"},
+        {{{"class", "TAVSessionConfiguration"}, {"identifier", "id"}}, "configuration requires identifier and agent"},
+        {{{"class", "TAVSessionConfiguration"}, {"identifier", ""}, {"userAgent", "A/1"}},
+         "client session identifier cannot be nil or empty"}};
     for (const auto& [configuration, text] : cases) {
         platform::test::LogCapture log;
         auto connection = connect();
@@ -123,9 +125,8 @@ TEST_F(ConnectionTest, ACallerWithOneCallIntroducesItselfInsideItsRequest)
         device.drain();
         return std::pair(connection, call);
     };
-    const auto [connection, call] = ask(Value::dictionaryOf({{"class", "TAVSessionConfiguration"},
-                                                             {"identifier", "com.quorvane.vistrel"},
-                                                             {"userAgent", "Vistrel/4"}}));
+    const auto [connection, call] = ask(Value::dictionaryOf(
+        {{"class", "TAVSessionConfiguration"}, {"identifier", "com.quorvane.vistrel"}, {"userAgent", "Vistrel/4"}}));
     lastTask()->respond(200, "[]");
     device.drain();
     EXPECT_EQ(call->argument(1)["class"], Value("TAVReply"));

@@ -1,7 +1,7 @@
-#include <gtest/gtest.h>
-
 #include <pthread.h>
 #include <random>
+
+#include <gtest/gtest.h>
 
 #include "tavrind/CritbitTree.h"
 #include "tests/support/CritbitModel.h"

@@ -1,12 +1,12 @@
-#include "tavrind/DeepLinks.h"
-
 #include <algorithm>
 
 #include <gtest/gtest.h>
 
-#include "platform/PrivacyLedger.h"
-#include "platform/Value.h"
+#include "platform/privacy/PrivacyLedger.h"
+#include "platform/values/Json.h"
+#include "platform/values/Value.h"
 #include "tavrind/Assembly.h"
+#include "tavrind/DeepLinks.h"
 #include "tavrind/TavrinDPAppDeepLinkIngester.h"
 #include "tavrind/TavrinDPPeriodicTask.h"
 #include "tavrind/TavrinDPPeriodicTaskManager.h"

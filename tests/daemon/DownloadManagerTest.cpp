@@ -1,10 +1,13 @@
-#include <gtest/gtest.h>
+#include "tavrind/DownloadManager.h"
 
 #include <unistd.h>
 
+#include <gtest/gtest.h>
+
 #include "CoreTavrin/TAVBag.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "tavrind/Assembly.h"
-#include "tavrind/DownloadManager.h"
 #include "tavrind/TAVNetworkRequestFactory.h"
 #include "tavrind/TavrinBagController.h"
 #include "tests/support/TestDevice.h"

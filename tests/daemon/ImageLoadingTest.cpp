@@ -4,7 +4,10 @@
 
 #include "CoreTavrin/ResponseImages.h"
 #include "CoreTavrin/TAVBag.h"
-#include "platform/HttpCache.h"
+#include "platform/net/HttpCache.h"
+#include "platform/net/UrlSessionCurl.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "searchrecords/ZRErrorFeedback.h"
 #include "searchrecords/ZRNetworkFeedback.h"
 #include "tavrind/ClientStateManager.h"

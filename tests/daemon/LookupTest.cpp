@@ -1,8 +1,11 @@
+#include "tavrind/Lookup.h"
+
 #include <gtest/gtest.h>
 
 #include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVRequest.h"
-#include "tavrind/Lookup.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "tavrind/TavrinBagController.h"
 #include "tests/support/DaemonFixture.h"
 

@@ -1,10 +1,13 @@
+#include "tavrind/QueryCache.h"
+
 #include <algorithm>
 #include <random>
 
 #include "CoreTavrin/TAVFeedback.h"
 #include "CoreTavrin/TAVRequest.h"
-#include "platform/Text.h"
-#include "tavrind/QueryCache.h"
+#include "platform/text/Text.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "tavrind/TavrinUserGUIDController.h"
 #include "tests/support/CacheModel.h"
 #include "tests/support/DaemonFixture.h"

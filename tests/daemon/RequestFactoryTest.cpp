@@ -2,6 +2,7 @@
 
 #include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVRequest.h"
+#include "platform/values/Json.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/TAVNetworkRequestFactory.h"
 #include "tavrind/TavrinBagController.h"
@@ -253,8 +254,7 @@ TEST_F(RequestFactoryTest, OnlyAllowedSourcesTellThePlace)
 TEST_F(RequestFactoryTest, ChangesThatConcernTheBagAreTold)
 {
     int told = 0;
-    const auto token = device.notifications.observe(
-        TAVBagRefreshRequired, [&](const auto&) { ++told; }, factory.get());
+    const auto token = device.notifications.observe(TAVBagRefreshRequired, [&](const auto&) { ++told; }, factory.get());
     device.drain();
     EXPECT_EQ(told, 0) << "not for the first computation";
 

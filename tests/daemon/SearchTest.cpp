@@ -1,4 +1,5 @@
 #include "CoreTavrin/TAVFeedback.h"
+#include "platform/values/Dictionary.h"
 #include "searchrecords/ZRErrorFeedback.h"
 #include "searchrecords/ZRNetworkFeedback.h"
 #include "tests/support/DaemonFixture.h"

@@ -1,7 +1,10 @@
 #include <algorithm>
 #include <random>
 
-#include "platform/Record.h"
+#include "platform/values/Archive.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
+#include "platform/values/Record.h"
 #include "tavrind/ArchivedDataIterator.h"
 #include "tavrind/ClientSessionHeader.h"
 #include "tavrind/OutputStream.h"

@@ -4,6 +4,7 @@
 
 #include <fmt/format.h>
 
+#include "platform/values/Dictionary.h"
 #include "tavrind/ClientSession.h"
 #include "tavrind/TavrinService.h"
 #include "tavrind/TavrinUserGUIDController.h"

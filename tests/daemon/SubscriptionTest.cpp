@@ -1,6 +1,8 @@
 #include <gtest/gtest.h>
 
 #include "CoreTavrin/TAVBag.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/TAVNetworkRequestFactory.h"
 #include "tavrind/TavrinBagController.h"

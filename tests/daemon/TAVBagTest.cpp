@@ -1,6 +1,8 @@
+#include "CoreTavrin/TAVBag.h"
+
 #include <gtest/gtest.h>
 
-#include "CoreTavrin/TAVBag.h"
+#include "platform/values/Json.h"
 
 namespace tavrin {
 namespace {

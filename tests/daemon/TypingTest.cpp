@@ -1,12 +1,13 @@
-// Users who type, over the whole road of a search: a corpus of real shape beside a model of the cache, and random schedules of
-// everything that can happen on the way.
+// Users who type, over the whole road of a search: a corpus of real shape beside a model of the cache, and random
+// schedules of everything that can happen on the way.
 
 #include <cstdlib>
 #include <random>
 #include <set>
 
-#include "platform/Files.h"
-#include "platform/JsonDocument.h"
+#include "platform/files/Files.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "tests/support/CacheModel.h"
 #include "tests/support/DaemonFixture.h"
 #include "tools/replay/Corpus.h"
@@ -190,9 +191,7 @@ private:
     void step()
     {
         switch (upTo(19)) {
-        case 0:
-            _test.device.advance(std::chrono::seconds(upTo(40)));
-            break;
+        case 0: _test.device.advance(std::chrono::seconds(upTo(40))); break;
         case 1: {
             User& user = anyUser();
             disconnect(user);
@@ -200,9 +199,12 @@ private:
             break;
         }
         case 2:
-            if (oneIn(3)) _test.device.locale.handler(platform::LocaleSource::Change::Locale);
-            else if (oneIn(2)) _test.device.memoryPressure.raise();
-            else (void)_test.configure(*anyUser().connection, "com.quorvane.vistrel." + _name, "Vistrel/6");
+            if (oneIn(3))
+                _test.device.locale.handler(platform::LocaleSource::Change::Locale);
+            else if (oneIn(2))
+                _test.device.memoryPressure.raise();
+            else
+                (void)_test.configure(*anyUser().connection, "com.quorvane.vistrel." + _name, "Vistrel/6");
             break;
         case 3: // several keys before the daemon runs
             for (unsigned i = upTo(3); i < 4; ++i) key(anyUser());
@@ -221,20 +223,18 @@ private:
 
     void key(User& user)
     {
-        if (!user.text.empty() && oneIn(3)) user.text.pop_back();
-        else user.text += oneIn(8) ? 'A' : static_cast<char>('a' + upTo(2));
+        if (!user.text.empty() && oneIn(3))
+            user.text.pop_back();
+        else
+            user.text += oneIn(8) ? 'A' : static_cast<char>('a' + upTo(2));
         const bool outOfOrder = oneIn(12);
         const std::int64_t id = user.newest + (outOfOrder ? -static_cast<int>(upTo(3)) : 1 + static_cast<int>(upTo(2)));
-        Dictionary fields{{"queryString", user.text},
-                          {"class", "TAVSearchRequest"},
-                          {"queryId", id},
-                          {"scale", oneIn(6) ? 3.0 : 2.0},
-                          {"keyboardInputMode", "de"},
-                          {"verboseReply", true}};
+        Dictionary fields{{"queryString", user.text},      {"class", "TAVSearchRequest"}, {"queryId", id},
+                          {"scale", oneIn(6) ? 3.0 : 2.0}, {"keyboardInputMode", "de"},   {"verboseReply", true}};
         const bool withItems = oneIn(10);
         if (withItems)
-            fields.set("queryItems", Value::Array{Value::dictionaryOf(
-                                         {{"class", "TAVQueryItem"}, {"name", "x"}, {"value", "y"}})});
+            fields.set("queryItems",
+                       Value::Array{Value::dictionaryOf({{"class", "TAVQueryItem"}, {"name", "x"}, {"value", "y"}})});
         const bool newest = id > user.newest;
         user.newest = std::max(user.newest, id);
         user.calls.push_back({user.connection->call("Request", {std::move(fields)}), id, user.text, newest, withItems});
@@ -282,8 +282,10 @@ private:
                 EXPECT_EQ(call.call->argument(0), Value(call.id));
                 if (reply.count() == 0) continue;
                 EXPECT_TRUE(call.newest) << call.text << " was no news when it came, and got an answer";
-                if (reply["httpResponse"].count() > 0) judgeFromService(user, call);
-                else judgeFromCache(call, reply);
+                if (reply["httpResponse"].count() > 0)
+                    judgeFromService(user, call);
+                else
+                    judgeFromCache(call, reply);
             }
     }
     void judgeFromService(const User& user, Call& call)
@@ -301,7 +303,8 @@ private:
         };
         EXPECT_TRUE(lower("query").starts_with(typed) && typed.starts_with(lower("input")))
             << call.text << " got " << platform::toJson(set);
-        const double age = platform::secondsSince1970(_test.device.clock.wallNow()) - set["made"].asDouble().value_or(0);
+        const double age =
+            platform::secondsSince1970(_test.device.clock.wallNow()) - set["made"].asDouble().value_or(0);
         EXPECT_LT(age, set["max_age"].asDouble().value_or(1e9)) << call.text;
         EXPECT_NE(set["status"], Value("ERROR"));
         EXPECT_FALSE(call.withItems) << call.text << " has items of its own";

@@ -1,6 +1,8 @@
 #include <openssl/evp.h>
 
-#include "platform/Record.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
+#include "platform/values/Record.h"
 #include "tavrind/ArchivedDataIterator.h"
 #include "tavrind/ClientSession.h"
 #include "tavrind/CompressedOutputStream.h"

@@ -6,7 +6,9 @@
 #include <gtest/gtest.h>
 
 #include "CoreTavrin/TAVBag.h"
-#include "platform/Error.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Error.h"
+#include "platform/values/Json.h"
 #include "tools/devserver/Resources.h"
 
 namespace devserver {

@@ -5,7 +5,7 @@
 
 #include <gtest/gtest.h>
 
-#include "platform/Url.h"
+#include "platform/net/Url.h"
 
 namespace devserver {
 namespace {

@@ -2,10 +2,10 @@
 
 #include <fstream>
 #include <sstream>
-
-#include <gtest/gtest.h>
 #include <stdlib.h>
 #include <sys/stat.h>
+
+#include <gtest/gtest.h>
 
 namespace devserver {
 namespace {
@@ -22,7 +22,7 @@ std::string contents(const std::filesystem::path& path)
 
 unsigned mode(const std::filesystem::path& path)
 {
-    struct stat info {};
+    struct stat info{};
     return stat(path.c_str(), &info) == 0 ? info.st_mode & 0777 : 0;
 }
 

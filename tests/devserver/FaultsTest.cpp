@@ -2,7 +2,8 @@
 
 #include <gtest/gtest.h>
 
-#include "platform/Error.h"
+#include "platform/values/Error.h"
+#include "platform/values/Json.h"
 
 namespace devserver {
 namespace {

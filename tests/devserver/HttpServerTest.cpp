@@ -1,12 +1,12 @@
 #include "tools/devserver/HttpServer.h"
 
-#include <future>
-#include <thread>
-
 #include <arpa/inet.h>
-#include <gtest/gtest.h>
+#include <future>
 #include <netinet/in.h>
 #include <sys/socket.h>
+#include <thread>
+
+#include <gtest/gtest.h>
 
 #include "tools/devserver/Gate.h"
 

@@ -1,11 +1,13 @@
 #include "tools/devserver/Service.h"
 
+#include <sys/socket.h>
 #include <thread>
 
 #include <gtest/gtest.h>
-#include <sys/socket.h>
 
-#include "platform/Error.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Error.h"
+#include "platform/values/Json.h"
 #include "tools/devserver/Images.h"
 
 namespace devserver {

@@ -6,7 +6,9 @@
 #include <gmock/gmock.h>
 #include <openssl/evp.h>
 
-#include "platform/Error.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Error.h"
+#include "platform/values/Json.h"
 #include "tools/devserver/Service.h"
 #include "tools/devserver/SessionShape.h"
 

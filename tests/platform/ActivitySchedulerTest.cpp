@@ -1,9 +1,10 @@
-#include <gtest/gtest.h>
+#include "platform/device/ActivityScheduler.h"
 
 #include <fmt/format.h>
+#include <gtest/gtest.h>
 
-#include "platform/ActivityPolicy.h"
-#include "platform/ActivityScheduler.h"
+#include "platform/device/ActivityPolicy.h"
+#include "platform/device/DeviceUseLogind.h"
 #include "tests/support/FakeBackground.h"
 #include "tests/support/ManualClock.h"
 #include "tests/support/ManualExecutor.h"

@@ -1,10 +1,11 @@
-#include "platform/AppActivities.h"
+#include "platform/device/AppActivities.h"
 
-#include <gtest/gtest.h>
 #include <sys/stat.h>
 
-#include "platform/Files.h"
-#include "platform/Sqlite.h"
+#include <gtest/gtest.h>
+
+#include "platform/files/Files.h"
+#include "platform/files/Sqlite.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace platform {
@@ -81,7 +82,7 @@ TEST_F(AppActivitiesTest, KeepEveryFieldAndTheirAbsence)
     EXPECT_EQ(read[1].contentUrl, "");
     EXPECT_FALSE(read[1].publiclyIndexable);
 
-    struct stat status {};
+    struct stat status{};
     ASSERT_EQ(stat(file.c_str(), &status), 0);
     EXPECT_EQ(status.st_mode & 0777, 0600u);
 }

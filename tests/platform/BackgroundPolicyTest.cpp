@@ -1,11 +1,13 @@
-#include <gtest/gtest.h>
+#include "platform/net/BackgroundPolicy.h"
 
 #include <cerrno>
 
-#include "platform/BackgroundPolicy.h"
-#include "platform/LivedTime.h"
-#include "platform/NetworkStatus.h"
-#include "platform/UrlSession.h"
+#include <gtest/gtest.h>
+
+#include "platform/net/NetworkStatus.h"
+#include "platform/net/NetworkStatusNetworkManager.h"
+#include "platform/net/UrlSession.h"
+#include "platform/run/LivedTime.h"
 #include "tests/support/ManualClock.h"
 
 namespace platform {

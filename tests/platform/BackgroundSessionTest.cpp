@@ -1,4 +1,4 @@
-#include <gtest/gtest.h>
+#include "platform/net/BackgroundSession.h"
 
 #include <csignal>
 #include <fcntl.h>
@@ -7,10 +7,11 @@
 #include <unistd.h>
 
 #include <fmt/format.h>
+#include <gtest/gtest.h>
 
-#include "platform/BackgroundSession.h"
-#include "platform/Files.h"
-#include "platform/NetworkStatus.h"
+#include "platform/files/Files.h"
+#include "platform/net/NetworkStatus.h"
+#include "platform/values/Json.h"
 #include "tests/support/FakeUrlLoader.h"
 #include "tests/support/ManualClock.h"
 #include "tests/support/ManualExecutor.h"
@@ -158,7 +159,7 @@ TEST_F(BackgroundSessionTest, AnUploadHasItsOwnCopyAndEndsOnce)
     task->resume();
     ASSERT_EQ(process.attempts().size(), 1u);
     EXPECT_EQ(contentsOf(process.attempts()[0]->files.upload.fd()), "the body");
-    struct stat status {};
+    struct stat status{};
     ASSERT_EQ(stat(store().c_str(), &status), 0);
     EXPECT_EQ(status.st_mode & 0777, 0700u);
     for (const auto& entry : fs::directory_iterator(store())) {

@@ -1,10 +1,13 @@
-#include <gtest/gtest.h>
+#include "platform/files/Counters.h"
 
 #include <thread>
 
-#include "platform/Counters.h"
-#include "platform/Queue.h"
-#include "platform/Value.h"
+#include <gtest/gtest.h>
+
+#include "platform/run/Queue.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
+#include "platform/values/Value.h"
 #include "tests/support/ManualClock.h"
 #include "tests/support/ManualExecutor.h"
 #include "tests/support/MemoryFiles.h"
@@ -114,12 +117,12 @@ TEST_F(CountersTest, OpenMetricsTextCannotBeBrokenByNames)
     counters.add("b.\"quoted\"\\", 1);
     counters.add("a\n# EOF", -2);
     counters.add("ü", 3);
-    EXPECT_EQ(counters.openMetrics(), "# TYPE tavrind_counter unknown\n"
-                                      "tavrind_counter{key=\"a\\n# EOF\"} -2\n"
-                                      "tavrind_counter{key=\"b.\\\"quoted\\\"\\\\\"} 1\n"
-                                      "tavrind_counter{key=\"ü\"} 3\n"
-                                      "# EOF\n");
-    EXPECT_EQ(CounterStore().openMetrics(), "# TYPE tavrind_counter unknown\n# EOF\n");
+    EXPECT_EQ(counters.openMetrics("probe"), "# TYPE probe unknown\n"
+                                             "probe{key=\"a\\n# EOF\"} -2\n"
+                                             "probe{key=\"b.\\\"quoted\\\"\\\\\"} 1\n"
+                                             "probe{key=\"ü\"} 3\n"
+                                             "# EOF\n");
+    EXPECT_EQ(CounterStore().openMetrics("probe"), "# TYPE probe unknown\n# EOF\n");
 }
 
 TEST_F(CountersTest, ThreadsLoseNoAddition)

@@ -1,8 +1,8 @@
-#include <gtest/gtest.h>
+#include "platform/base/Date.h"
 
 #include <cmath>
 
-#include "platform/Date.h"
+#include <gtest/gtest.h>
 
 namespace platform {
 namespace {

@@ -1,8 +1,10 @@
+#include "platform/device/DeviceProfile.h"
+
 #include <gtest/gtest.h>
 
-#include "platform/DeviceProfile.h"
-#include "platform/Files.h"
-#include "platform/RunLoop.h"
+#include "platform/files/Files.h"
+#include "platform/run/RunLoop.h"
+#include "platform/values/Json.h"
 #include "tests/support/TemporaryDirectory.h"
 #include "tests/support/TestDevice.h"
 

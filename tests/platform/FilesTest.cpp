@@ -1,4 +1,4 @@
-#include <gtest/gtest.h>
+#include "platform/files/Files.h"
 
 #include <algorithm>
 #include <fcntl.h>
@@ -7,7 +7,8 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include "platform/Files.h"
+#include <gtest/gtest.h>
+
 #include "tests/support/FullDisk.h"
 #include "tests/support/TemporaryDirectory.h"
 
@@ -23,7 +24,7 @@ struct FilesTest : testing::Test {
     std::string contents(const fs::path& path) const { return std::string(files->read(path, 1 << 20)->view()); }
     static unsigned mode(const fs::path& path)
     {
-        struct stat status {};
+        struct stat status{};
         return stat(path.c_str(), &status) == 0 ? status.st_mode & 07777 : 0;
     }
 
@@ -141,8 +142,7 @@ TEST_F(FilesTest, ALockIsHeldByOneHandleAtATime)
 TEST_F(FilesTest, AReplacedFileIsTheOldOrTheNewAlsoAcrossFileSystems)
 {
     const test::TemporaryDirectory memory("/dev/shm");
-    struct stat here {
-    }, there{};
+    struct stat here{}, there{};
     ASSERT_EQ(stat(directory.path.c_str(), &here) | stat(memory.path.c_str(), &there), 0);
     if (here.st_dev == there.st_dev) GTEST_SKIP() << "there is one file system only";
     for (const fs::path& source : {directory / "source", memory / "source"}) {

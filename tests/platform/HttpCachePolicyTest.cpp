@@ -1,6 +1,6 @@
-#include <gtest/gtest.h>
+#include "platform/net/HttpCachePolicy.h"
 
-#include "platform/HttpCachePolicy.h"
+#include <gtest/gtest.h>
 
 namespace platform {
 namespace {

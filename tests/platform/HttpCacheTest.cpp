@@ -1,4 +1,4 @@
-#include <gtest/gtest.h>
+#include "platform/net/HttpCache.h"
 
 #include <algorithm>
 #include <csignal>
@@ -9,11 +9,11 @@
 #include <unistd.h>
 
 #include <fmt/format.h>
+#include <gtest/gtest.h>
 
-#include "platform/HttpCache.h"
-#include "platform/HttpCacheStore.h"
-#include "platform/Log.h"
-#include "platform/Queue.h"
+#include "platform/base/Log.h"
+#include "platform/net/HttpCacheStore.h"
+#include "platform/run/Queue.h"
 #include "tests/support/ManualClock.h"
 #include "tests/support/ManualExecutor.h"
 #include "tests/support/TemporaryDirectory.h"
@@ -126,7 +126,7 @@ TEST_F(HttpCacheTest, AnswersAreFoundWholeAtOnceAndAfterARestart)
     EXPECT_EQ(find(1), "(none)");
     EXPECT_EQ(find(2), "replaced");
 
-    struct stat status {};
+    struct stat status{};
     ASSERT_EQ(stat((directory / "http").c_str(), &status), 0);
     EXPECT_EQ(status.st_mode & 0777, 0700u);
     ASSERT_EQ(stat((directory / "http/index.db").c_str(), &status), 0);

@@ -1,9 +1,10 @@
+#include "platform/device/InstalledApplications.h"
+
 #include <gtest/gtest.h>
 
-#include "platform/Files.h"
-#include "platform/InstalledApplications.h"
-#include "platform/Log.h"
-#include "platform/RunLoop.h"
+#include "platform/base/Log.h"
+#include "platform/files/Files.h"
+#include "platform/run/RunLoop.h"
 #include "tests/support/ManualClock.h"
 #include "tests/support/TemporaryDirectory.h"
 

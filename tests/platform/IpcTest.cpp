@@ -1,4 +1,4 @@
-#include "platform/Ipc.h"
+#include "platform/ipc/Ipc.h"
 
 #include <condition_variable>
 #include <cstdlib>
@@ -16,9 +16,14 @@
 #include <gmock/gmock.h>
 #include <systemd/sd-bus.h>
 
-#include "platform/ListenSocket.h"
-#include "platform/Log.h"
-#include "platform/RunLoop.h"
+#include "platform/base/Log.h"
+#include "platform/ipc/BusClient.h"
+#include "platform/ipc/BusTransport.h"
+#include "platform/ipc/ListenSocket.h"
+#include "platform/run/RunLoop.h"
+#include "platform/run/WorkerPool.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "tests/support/ManualClock.h"
 #include "tests/support/TemporaryDirectory.h"
 
@@ -28,13 +33,15 @@ namespace {
 using namespace std::chrono_literals;
 using testing::HasSubstr;
 
-constexpr Duration kLong = 60s; // only a failing test waits this long
+constexpr Duration kLong = 60s;                        // only a failing test waits this long
 constexpr std::size_t kBeyondSocketBuffers = 20 << 20; // sd-bus asks for 8 MiB
+constexpr const char* kObjectPath = "/com/example/probe";
 constexpr std::string_view kEveryType = "sxtuibdaya{sv}aa{sv}asah";
 
 const Interface& probe()
 {
     static const Interface interface{
+        .path = kObjectPath,
         .name = "com.example.Probe",
         .methods = {{"Echo", kEveryType, kEveryType},
                     {"Take", "a{sv}", "a{sv}"},
@@ -112,7 +119,10 @@ public:
         loop.execute(Priority::Default, [&] { done.set_value(); });
         done.get_future().wait();
     }
-    std::unique_ptr<Client> connect(const Listener& to) { return std::move(*Client::connect(to.endpoint(), kLong)); }
+    std::unique_ptr<Client> connect(const Listener& to)
+    {
+        return std::move(*Client::connect(to.endpoint(), kObjectPath, kLong));
+    }
     std::unique_ptr<Client> connect() { return connect(*listener); }
 
     RunLoop loop;
@@ -330,7 +340,8 @@ TEST(Ipc, DeafPeerIsDroppedAndOthersGoOn)
     auto deaf = service.connect();
     auto other = service.connect();
     service.await([&] { return service.connections.size() == 2; });
-    for (int i = 0; i < 3; ++i) service.connections[0]->push("Told", {{std::string(kBeyondSocketBuffers, 'x'), Dictionary()}, {}});
+    for (int i = 0; i < 3; ++i)
+        service.connections[0]->push("Told", {{std::string(kBeyondSocketBuffers, 'x'), Dictionary()}, {}});
     service.await([&] { return service.notes == std::vector<std::string>{"<invalidated>"}; });
     EXPECT_TRUE(call(*other, method("Count")));
     EXPECT_FALSE(deaf->wait([] { return false; }, kLong));
@@ -432,7 +443,7 @@ TEST(Ipc, EndpointsAreApartFromEachOtherAndGoWithTheirListener)
 
     const std::string address = endpoint->endpoint();
     endpoint.reset();
-    EXPECT_FALSE(Client::connect(address, kLong));
+    EXPECT_FALSE(Client::connect(address, kObjectPath, kLong));
     EXPECT_TRUE(call(*client, method("Count"))) << "a connection outlives its listener";
 }
 
@@ -533,20 +544,25 @@ TEST(Ipc, ToolsOfOthersCanCallAndIntrospect)
     const struct {
         std::string program, arguments, expected;
     } cases[] = {
-        {"busctl", address + " call com.example.x " + object + " com.example.Probe Take a{sv} 1 k s v", "a{sv} 1 \"k\" s \"v\""},
+        {"busctl", address + " call com.example.x " + object + " com.example.Probe Take a{sv} 1 k s v",
+         "a{sv} 1 \"k\" s \"v\""},
         {"busctl", address + " call com.example.x " + object + " com.example.Probe Note s hello", ""},
-        {"busctl", address + " call com.example.x " + object + " com.example.Probe Take s v", "takes \"a{sv}\", not \"s\""},
+        {"busctl", address + " call com.example.x " + object + " com.example.Probe Take s v",
+         "takes \"a{sv}\", not \"s\""},
         {"busctl", address + " introspect com.example.x " + object, ".Hold"},
         {"busctl", address + " tree com.example.x", object},
         {"busctl", address + " call com.example.x " + object + " org.freedesktop.DBus.Peer Ping", ""},
-        {"gdbus", "call --dest com.example.x " + address + " --object-path " + object + " --method com.example.Extra.Count", "(uint32 7,)"},
+        {"gdbus",
+         "call --dest com.example.x " + address + " --object-path " + object + " --method com.example.Extra.Count",
+         "(uint32 7,)"},
         {"gdbus", "introspect --recurse --dest com.example.x " + address + " --object-path /", "Hold();"},
     };
     for (const auto& tool : cases) {
         if (std::system(("command -v " + tool.program + " >/dev/null").c_str()) != 0)
             GTEST_SKIP() << "no " << tool.program;
         const std::string output = commandOutput(tool.program + " " + tool.arguments);
-        EXPECT_TRUE(tool.expected.empty() ? output.empty() : output.contains(tool.expected)) << tool.arguments << "\n" << output;
+        EXPECT_TRUE(tool.expected.empty() ? output.empty() : output.contains(tool.expected)) << tool.arguments << "\n"
+                                                                                             << output;
     }
     service.await([&] { return std::ranges::count(service.notes, "hello") == 1; });
 }

@@ -1,10 +1,12 @@
+#include "platform/values/Json.h"
+
 #include <limits>
 
 #include <gtest/gtest.h>
 
-#include "platform/Error.h"
-#include "platform/JsonDocument.h"
-#include "platform/Value.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Error.h"
+#include "platform/values/Value.h"
 
 namespace platform {
 namespace {

@@ -1,7 +1,9 @@
+#include "platform/device/LocaleSource.h"
+
 #include <gtest/gtest.h>
 
-#include "platform/LocaleSource.h"
-#include "platform/RunLoop.h"
+#include "platform/device/LocaleSourceIcu.h"
+#include "platform/run/RunLoop.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace platform {

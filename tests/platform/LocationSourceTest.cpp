@@ -1,10 +1,10 @@
-#include <gtest/gtest.h>
+#include "platform/device/LocationSource.h"
 
 #include <cmath>
 #include <numbers>
 #include <set>
 
-#include "platform/LocationSource.h"
+#include <gtest/gtest.h>
 
 namespace platform {
 namespace {

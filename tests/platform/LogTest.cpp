@@ -1,6 +1,6 @@
-#include <gtest/gtest.h>
+#include "platform/base/Log.h"
 
-#include "platform/Log.h"
+#include <gtest/gtest.h>
 
 namespace platform {
 namespace {

@@ -1,11 +1,13 @@
-#include <gtest/gtest.h>
+#include "platform/device/MemoryPressure.h"
 
 #include <array>
 #include <fcntl.h>
 #include <sys/socket.h>
 
-#include "platform/MemoryPressure.h"
-#include "platform/RunLoop.h"
+#include <gtest/gtest.h>
+
+#include "platform/device/MemoryPressurePsi.h"
+#include "platform/run/RunLoop.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace platform {

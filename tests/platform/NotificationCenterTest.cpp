@@ -1,10 +1,10 @@
-#include <gtest/gtest.h>
+#include "platform/run/NotificationCenter.h"
 
 #include <atomic>
 #include <optional>
 #include <thread>
 
-#include "platform/NotificationCenter.h"
+#include <gtest/gtest.h>
 
 namespace platform {
 namespace {

@@ -1,15 +1,16 @@
-#include "platform/PrivacyRecorder.h"
+#include "platform/privacy/PrivacyRecorder.h"
 
 #include <algorithm>
 #include <array>
 #include <cerrno>
 #include <cmath>
 #include <random>
-
-#include <gtest/gtest.h>
 #include <sys/stat.h>
 
-#include "platform/Value.h"
+#include <gtest/gtest.h>
+
+#include "platform/values/Json.h"
+#include "platform/values/Value.h"
 #include "tests/support/ManualClock.h"
 #include "tests/support/MemoryFiles.h"
 #include "tests/support/TemporaryDirectory.h"
@@ -299,7 +300,7 @@ TEST(PrivacyRecorderOnDisk, ItsFilesAreTheUsersAlone)
     const fs::path directory = temporary / "state/privacy";
     ASSERT_TRUE(PrivacyRecorder(*files, clock, directory).record("key", {"a", "b"}));
     for (const char* name : {"", "ledger", "reports.json"}) {
-        struct stat status {};
+        struct stat status{};
         ASSERT_EQ(stat((directory / name).c_str(), &status), 0) << name;
         EXPECT_EQ(status.st_mode & 0777, *name ? 0600u : 0700u) << name;
     }

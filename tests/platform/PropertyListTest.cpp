@@ -1,7 +1,11 @@
+#include "platform/values/PropertyList.h"
+
 #include <gtest/gtest.h>
 
-#include "platform/Error.h"
-#include "platform/Value.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Error.h"
+#include "platform/values/Json.h"
+#include "platform/values/Value.h"
 
 namespace platform {
 namespace {

@@ -1,11 +1,13 @@
-#include <gtest/gtest.h>
+#include "platform/run/Queue.h"
 
 #include <atomic>
 #include <future>
 #include <latch>
 #include <thread>
 
-#include "platform/Queue.h"
+#include <gtest/gtest.h>
+
+#include "platform/run/WorkerPool.h"
 #include "tests/support/ManualClock.h"
 #include "tests/support/ManualExecutor.h"
 
@@ -22,7 +24,10 @@ struct QueueTest : testing::Test {
     std::vector<int> order;
 
     std::shared_ptr<Queue> serial() { return Queue::make("test.serial", Queue::Kind::Serial, executor, clock); }
-    std::shared_ptr<Queue> concurrent() { return Queue::make("test.concurrent", Queue::Kind::Concurrent, executor, clock); }
+    std::shared_ptr<Queue> concurrent()
+    {
+        return Queue::make("test.concurrent", Queue::Kind::Concurrent, executor, clock);
+    }
     auto note(int i)
     {
         return [this, i] { order.push_back(i); };
@@ -188,8 +193,10 @@ TEST_F(QueueThreads, SerialTasksNeverOverlapAndKeepTheirOrder)
                         if (last[t] >= i) ++disorder;
                         last[t] = i;
                     };
-                    if (i % 3 == 0) queue->sync(task);
-                    else queue->async(task);
+                    if (i % 3 == 0)
+                        queue->sync(task);
+                    else
+                        queue->async(task);
                 }
             });
         }
@@ -215,10 +222,14 @@ TEST_F(QueueThreads, WritersExcludeReaders)
                     ++value.second;
                 };
                 for (int i = 0; i < 2000; ++i) {
-                    if (i % 7 == t) queue->barrierSync(write);
-                    else if (i % 7 == t + 1) queue->barrierAsync(write);
-                    else if (i % 2) queue->sync(read);
-                    else queue->async(read);
+                    if (i % 7 == t)
+                        queue->barrierSync(write);
+                    else if (i % 7 == t + 1)
+                        queue->barrierAsync(write);
+                    else if (i % 2)
+                        queue->sync(read);
+                    else
+                        queue->async(read);
                 }
             });
         }

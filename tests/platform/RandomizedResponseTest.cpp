@@ -1,4 +1,4 @@
-#include "platform/RandomizedResponse.h"
+#include "platform/privacy/RandomizedResponse.h"
 
 #include <algorithm>
 #include <array>
@@ -14,7 +14,7 @@
 
 #include <gtest/gtest.h>
 
-#include "platform/PrivacyLedger.h"
+#include "platform/privacy/PrivacyLedger.h"
 
 namespace platform {
 namespace {

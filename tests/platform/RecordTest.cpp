@@ -1,8 +1,12 @@
+#include "platform/values/Record.h"
+
 #include <chrono>
 
 #include <gtest/gtest.h>
 
-#include "platform/Record.h"
+#include "platform/values/Archive.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/ValueCoder.h"
 
 namespace platform {
 namespace {

@@ -1,9 +1,9 @@
-#include <gtest/gtest.h>
+#include "platform/run/Reply.h"
 
 #include <memory>
 #include <string>
 
-#include "platform/Reply.h"
+#include <gtest/gtest.h>
 
 namespace platform {
 namespace {

@@ -1,13 +1,15 @@
-#include <gtest/gtest.h>
+#include "platform/run/RunLoop.h"
 
 #include <csignal>
 #include <sys/epoll.h>
 #include <thread>
 #include <unistd.h>
 
-#include "platform/Clock.h"
-#include "platform/Files.h"
-#include "platform/RunLoop.h"
+#include <gtest/gtest.h>
+
+#include "platform/files/Files.h"
+#include "platform/run/Clock.h"
+#include "platform/run/SystemClock.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace platform {

@@ -1,8 +1,10 @@
+#include "platform/device/SubscriptionServices.h"
+
 #include <gtest/gtest.h>
 
-#include "platform/Files.h"
-#include "platform/RunLoop.h"
-#include "platform/SubscriptionServices.h"
+#include "platform/files/Files.h"
+#include "platform/run/RunLoop.h"
+#include "platform/values/Json.h"
 #include "tests/support/TemporaryDirectory.h"
 #include "tests/support/TestDevice.h"
 

@@ -1,17 +1,19 @@
-#include <gtest/gtest.h>
-
 #include <csignal>
 #include <cstdlib>
 #include <spawn.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <gtest/gtest.h>
 #include <systemd/sd-bus.h>
 
-#include "platform/DeviceUse.h"
-#include "platform/LocationSource.h"
-#include "platform/NetworkStatus.h"
-#include "platform/RunLoop.h"
+#include "platform/device/DeviceUse.h"
+#include "platform/device/DeviceUseLogind.h"
+#include "platform/device/LocationSource.h"
+#include "platform/device/LocationSourceGeoClue.h"
+#include "platform/net/NetworkStatus.h"
+#include "platform/net/NetworkStatusNetworkManager.h"
+#include "platform/run/RunLoop.h"
 #include "tests/support/TemporaryDirectory.h"
 #include "tests/support/TestDevice.h"
 
@@ -229,7 +231,7 @@ TEST_F(SystemBusTest, GeoClueIsAskedAsExactlyAsIsAllowedAndAnewWhereThatChanges)
                              kGeoClueManager, &geo);
     sd_bus_add_object_vtable(service, nullptr, "/client", "org.freedesktop.GeoClue2.Client", kGeoClueClient, &geo);
     sd_bus_add_object_vtable(service, nullptr, "/place", "org.freedesktop.GeoClue2.Location", kGeoCluePlace, &geo);
-    const auto location = makeGeoClueLocationSource(loop);
+    const auto location = makeGeoClueLocationSource(loop, "com.example.service");
     std::vector<std::string> told;
     location->onChange(
         [&](const auto& place, const std::string& reason) { told.push_back(place ? place->source : reason); });

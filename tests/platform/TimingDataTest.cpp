@@ -1,12 +1,13 @@
-#include <gtest/gtest.h>
-
 #include <set>
 #include <sstream>
 
 #include <fmt/format.h>
+#include <gtest/gtest.h>
 
-#include "platform/CurlSupport.h"
-#include "platform/Files.h"
+#include "platform/files/Files.h"
+#include "platform/net/CurlSupport.h"
+#include "platform/net/UrlSessionCurl.h"
+#include "platform/values/Dictionary.h"
 #include "tests/support/TestHttpServer.h"
 #include "tests/support/UrlLoads.h"
 

@@ -1,11 +1,11 @@
-#include <gtest/gtest.h>
-
 #include <fcntl.h>
 #include <unistd.h>
 
-#include "platform/BackgroundSession.h"
-#include "platform/Files.h"
-#include "platform/NetworkStatus.h"
+#include <gtest/gtest.h>
+
+#include "platform/files/Files.h"
+#include "platform/net/BackgroundSession.h"
+#include "platform/net/NetworkStatus.h"
 #include "tests/support/TemporaryDirectory.h"
 #include "tests/support/TestHttpServer.h"
 #include "tests/support/UrlLoads.h"

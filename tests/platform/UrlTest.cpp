@@ -1,6 +1,6 @@
-#include <gtest/gtest.h>
+#include "platform/net/Url.h"
 
-#include "platform/Url.h"
+#include <gtest/gtest.h>
 
 namespace platform {
 namespace {

@@ -1,11 +1,14 @@
-#include <gtest/gtest.h>
+#include "platform/files/UserDefaults.h"
 
 #include <sys/stat.h>
 
-#include "platform/Files.h"
-#include "platform/Queue.h"
-#include "platform/RunLoop.h"
-#include "platform/UserDefaults.h"
+#include <gtest/gtest.h>
+
+#include "platform/files/Files.h"
+#include "platform/run/Queue.h"
+#include "platform/run/RunLoop.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "tests/support/ManualClock.h"
 #include "tests/support/ManualExecutor.h"
 #include "tests/support/MemoryFiles.h"
@@ -20,7 +23,7 @@ using test::writeFile;
 
 struct UserDefaultsTest : testing::Test {
     static void SetUpTestSuite() { Log::threshold = LogLevel::Fault; } // what is expected is captured, not printed
-    ~UserDefaultsTest() override { executor.drain(); } // a write that waits holds its queue
+    ~UserDefaultsTest() override { executor.drain(); }                 // a write that waits holds its queue
 
     std::string text(const fs::path& file) const
     {
@@ -107,7 +110,7 @@ TEST_F(UserDefaultsTest, WhatIsSetIsSeenAtOnceAndWrittenTogether)
     executor.drain();
     EXPECT_EQ(toJson(file()), R"({"a":1,"date":1700000000.25})");
     EXPECT_EQ(UserDefaults(*files, path, queue).date("date"), date);
-    struct stat status {};
+    struct stat status{};
     stat(path.c_str(), &status);
     EXPECT_EQ(status.st_mode & 0777, 0600u);
 }

@@ -1,10 +1,12 @@
+#include "platform/values/Value.h"
+
 #include <limits>
 
 #include <gtest/gtest.h>
 
-#include "platform/Error.h"
-#include "platform/Uuid.h"
-#include "platform/Value.h"
+#include "platform/base/Uuid.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Error.h"
 
 namespace platform {
 namespace {

@@ -27,11 +27,9 @@ template <auto kValue> std::string enumeratorName()
 template <class E> std::vector<std::string> enumerators()
 {
     constexpr std::size_t kMore = 64;
-    std::vector<std::string> names = []<std::size_t... i>(std::index_sequence<i...>)
-    {
+    std::vector<std::string> names = []<std::size_t... i>(std::index_sequence<i...>) {
         return std::vector{enumeratorName<static_cast<E>(i)>()...};
-    }
-    (std::make_index_sequence<kMore>());
+    }(std::make_index_sequence<kMore>());
     names.erase(std::ranges::find(names, ""), names.end());
     return names;
 }

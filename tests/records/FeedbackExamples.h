@@ -9,7 +9,10 @@
 
 #include <gtest/gtest.h>
 
-#include "platform/Record.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
+#include "platform/values/Record.h"
+#include "platform/values/ValueCoder.h"
 #include "tavrind/TavrinFeedback.h"
 
 /// Help for tests of events: records and events in the notation of docs/feedback.md.

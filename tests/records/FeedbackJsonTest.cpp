@@ -1,9 +1,12 @@
+#include "tavrind/FeedbackJson.h"
+
 #include <regex>
 #include <set>
 
 #include <gtest/gtest.h>
 
-#include "tavrind/FeedbackJson.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "tavrind/FeedbackTypes.h"
 #include "tests/records/FeedbackExamples.h"
 

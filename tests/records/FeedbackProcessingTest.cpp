@@ -1,9 +1,13 @@
+#include "tavrind/FeedbackProcessing.h"
+
 #include <regex>
 
 #include <gtest/gtest.h>
 
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
+#include "platform/values/ValueCoder.h"
 #include "searchrecords/ZRResultFeedback.h"
-#include "tavrind/FeedbackProcessing.h"
 #include "tavrind/SessionProcessingHelper.h"
 #include "tavrind/TavrinSessionFeedback.h"
 #include "tests/records/FeedbackExamples.h"
@@ -100,8 +104,7 @@ TEST(SessionProcessing, IdentifiersBecomeNumbersAndWhatNoEventShowedIsMissing)
         SCOPED_TRACE(c.what);
         SessionProcessingHelper helper;
         std::string ids;
-        for (const char* record : c.records)
-            ids += idsIn(processed(feedbackFrom(spelledOut(record)), helper));
+        for (const char* record : c.records) ids += idsIn(processed(feedbackFrom(spelledOut(record)), helper));
         EXPECT_EQ(ids, c.ids);
         EXPECT_EQ(idsIn<TavrinSessionMissingResults>(helper.missingResults()), c.missingResults);
         EXPECT_EQ(idsIn<TavrinSessionMissingSuggestions>(helper.missingSuggestions()), c.missingSuggestions);

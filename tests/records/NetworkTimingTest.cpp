@@ -1,8 +1,11 @@
+#include "tavrind/NetworkTiming.h"
+
 #include <limits>
 
 #include <gtest/gtest.h>
 
-#include "tavrind/NetworkTiming.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "tests/records/FeedbackExamples.h"
 
 namespace tavrin {

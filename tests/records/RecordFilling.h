@@ -5,7 +5,9 @@
 #include <string>
 #include <vector>
 
-#include "platform/Record.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Record.h"
+#include "platform/values/ValueCoder.h"
 
 /// Help for tests that hold for every record class: they work on a record's own list of fields.
 namespace tavrin {

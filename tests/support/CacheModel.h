@@ -5,9 +5,10 @@
 #include <string>
 #include <vector>
 
-#include "platform/Date.h"
-#include "platform/Text.h"
-#include "platform/Value.h"
+#include "platform/base/Date.h"
+#include "platform/text/Text.h"
+#include "platform/values/Json.h"
+#include "platform/values/Value.h"
 
 namespace tavrin::test {
 

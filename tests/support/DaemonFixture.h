@@ -3,7 +3,8 @@
 #include <gtest/gtest.h>
 
 #include "CoreTavrin/TAVProtocols.h"
-#include "platform/Record.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Record.h"
 #include "tavrind/ClientSessionManager.h"
 #include "tavrind/FeedbackTypes.h"
 #include "tavrind/Startup.h"

@@ -5,10 +5,10 @@
 #include <string>
 #include <vector>
 
-#include "platform/ActivityScheduler.h"
-#include "platform/BackgroundSession.h"
-#include "platform/DeviceUse.h"
-#include "platform/Queue.h"
+#include "platform/device/ActivityScheduler.h"
+#include "platform/device/DeviceUse.h"
+#include "platform/net/BackgroundSession.h"
+#include "platform/run/Queue.h"
 #include "tests/support/MemoryFiles.h"
 
 namespace platform::test {
@@ -77,9 +77,11 @@ public:
 
     class Session final : public BackgroundSession {
     public:
-        Result<std::shared_ptr<BackgroundTask>> uploadTask(UrlRequest request, const std::filesystem::path& body) override
+        Result<std::shared_ptr<BackgroundTask>> uploadTask(UrlRequest request,
+                                                           const std::filesystem::path& body) override
         {
-            if (refuse) return std::unexpected(Error::withReason(std::string(kUrlErrorDomain), kUrlTooLarge, "too many tasks"));
+            if (refuse)
+                return std::unexpected(Error::withReason(std::string(kUrlErrorDomain), kUrlTooLarge, "too many tasks"));
             auto contents = _files->read(body, SIZE_MAX);
             if (!contents) return std::unexpected(contents.error());
             auto task = add(std::move(request));

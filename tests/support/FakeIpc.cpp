@@ -4,6 +4,9 @@
 
 #include <gtest/gtest.h>
 
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
+
 namespace platform::test {
 
 namespace {
@@ -285,7 +288,8 @@ std::shared_ptr<FakeConnection> FakeTransport::connect(std::string_view interfac
         _connections.push_back(connection);
     }
     // As with the real one, letting go of what the acceptor gets ends the connection.
-    acceptor(std::shared_ptr<ipc::Connection>(connection.get(), [connection](ipc::Connection*) { connection->invalidate(); }));
+    acceptor(std::shared_ptr<ipc::Connection>(connection.get(),
+                                              [connection](ipc::Connection*) { connection->invalidate(); }));
     return connection;
 }
 

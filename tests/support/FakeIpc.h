@@ -7,7 +7,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/Ipc.h"
+#include "platform/ipc/Ipc.h"
 
 namespace platform {
 class Clock;

@@ -6,9 +6,9 @@
 #include <unistd.h>
 #include <vector>
 
-#include "platform/HttpCache.h"
-#include "platform/Queue.h"
-#include "platform/UrlSession.h"
+#include "platform/net/HttpCache.h"
+#include "platform/net/UrlSession.h"
+#include "platform/run/Queue.h"
 
 namespace platform::test {
 
@@ -17,11 +17,11 @@ class FakeUrlLoader final : public UrlLoader {
 public:
     class Task final : public UrlTask, public std::enable_shared_from_this<Task> {
     public:
-        Task(std::uint64_t identifier, UrlRequest request, UrlSession::DataCompletion completion, std::shared_ptr<Queue> queue)
+        Task(std::uint64_t identifier, UrlRequest request, UrlSession::DataCompletion completion,
+             std::shared_ptr<Queue> queue)
             : _identifier(identifier), _request(std::move(request)), _completion(std::move(completion)),
               _queue(std::move(queue))
-        {
-        }
+        {}
         void resume() override { resumed = true; }
         void cancel() override { fail(Error::withReason(std::string(kUrlErrorDomain), kUrlCancelled, "cancelled")); }
         [[nodiscard]] std::uint64_t identifier() const override { return _identifier; }
@@ -72,10 +72,12 @@ public:
         }
         std::shared_ptr<UrlTask> dataTask(UrlRequest request, DataCompletion completion) override
         {
-            tasks.push_back(std::make_shared<Task>(tasks.size() + 1, std::move(request), std::move(completion), _queue));
+            tasks.push_back(
+                std::make_shared<Task>(tasks.size() + 1, std::move(request), std::move(completion), _queue));
             return tasks.back();
         }
-        std::shared_ptr<UrlTask> transferTask(UrlRequest request, TransferFiles files, DataCompletion completion) override
+        std::shared_ptr<UrlTask> transferTask(UrlRequest request, TransferFiles files,
+                                              DataCompletion completion) override
         {
             auto task = dataTask(std::move(request), std::move(completion));
             tasks.back()->files = std::move(files);
@@ -91,7 +93,8 @@ public:
         std::shared_ptr<HttpCache> _cache;
     };
 
-    std::shared_ptr<UrlSession> makeSession(UrlSessionConfiguration configuration, std::shared_ptr<Queue> queue) override
+    std::shared_ptr<UrlSession> makeSession(UrlSessionConfiguration configuration,
+                                            std::shared_ptr<Queue> queue) override
     {
         sessions.push_back(std::make_shared<Session>(std::move(configuration), std::move(queue)));
         return sessions.back();

@@ -1,7 +1,9 @@
 #pragma once
 
 #include "CoreTavrin/TAVFeedback.h"
-#include "platform/BackgroundSession.h"
+#include "platform/net/BackgroundSession.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "searchrecords/ZRRecords.h"
 #include "tavrind/BackgroundActivitiesManager.h"
 #include "tavrind/FeedbackBooks.h"

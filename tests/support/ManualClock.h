@@ -3,7 +3,7 @@
 #include <map>
 #include <mutex>
 
-#include "platform/Clock.h"
+#include "platform/run/Clock.h"
 
 namespace platform::test {
 
@@ -23,8 +23,9 @@ public:
     TimerId after(Duration delay, std::move_only_function<void()> fire) override
     {
         std::lock_guard lock(_mutex);
-        _timers.emplace(std::pair(_ticks + static_cast<std::uint64_t>(std::max(delay, Duration::zero()).count()), ++_lastId),
-                        std::move(fire));
+        _timers.emplace(
+            std::pair(_ticks + static_cast<std::uint64_t>(std::max(delay, Duration::zero()).count()), ++_lastId),
+            std::move(fire));
         return _lastId;
     }
     bool cancel(TimerId timer) override

@@ -5,7 +5,7 @@
 #include <deque>
 #include <mutex>
 
-#include "platform/Queue.h"
+#include "platform/run/Queue.h"
 
 namespace platform::test {
 

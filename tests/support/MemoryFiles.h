@@ -5,7 +5,7 @@
 #include <mutex>
 #include <set>
 
-#include "platform/Files.h"
+#include "platform/files/Files.h"
 
 namespace platform::test {
 

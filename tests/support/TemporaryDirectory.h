@@ -6,7 +6,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/RunLoop.h"
+#include "platform/run/RunLoop.h"
 
 namespace platform::test {
 

@@ -4,21 +4,22 @@
 #include <string>
 #include <vector>
 
-#include "platform/Counters.h"
-#include "platform/Device.h"
-#include "platform/DataDetectorStore.h"
-#include "platform/DeviceProfile.h"
-#include "platform/InstalledApplications.h"
-#include "platform/LocaleSource.h"
-#include "platform/LocationSource.h"
-#include "platform/NetworkStatus.h"
-#include "platform/Log.h"
-#include "platform/MemoryPressure.h"
-#include "platform/NotificationCenter.h"
-#include "platform/Process.h"
-#include "platform/SubscriptionServices.h"
-#include "platform/Transactions.h"
-#include "platform/UserDefaults.h"
+#include "platform/base/Log.h"
+#include "platform/device/DataDetectorStore.h"
+#include "platform/device/Device.h"
+#include "platform/device/DeviceProfile.h"
+#include "platform/device/InstalledApplications.h"
+#include "platform/device/LocaleSource.h"
+#include "platform/device/LocationSource.h"
+#include "platform/device/MemoryPressure.h"
+#include "platform/device/ProcessIdentity.h"
+#include "platform/device/SubscriptionServices.h"
+#include "platform/device/SystemNotifier.h"
+#include "platform/files/Counters.h"
+#include "platform/files/UserDefaults.h"
+#include "platform/net/NetworkStatus.h"
+#include "platform/run/NotificationCenter.h"
+#include "platform/run/Transactions.h"
 #include "tests/support/FakeBackground.h"
 #include "tests/support/FakeIpc.h"
 #include "tests/support/FakeUrlLoader.h"
@@ -60,7 +61,10 @@ struct FakeProfile final : DeviceProfileSource {
     DeviceProfile current;
     std::vector<std::function<void(const DeviceProfile&)>> handlers;
     DeviceProfile profile() override { return current; }
-    void onChange(std::function<void(const DeviceProfile&)> handler) override { handlers.push_back(std::move(handler)); }
+    void onChange(std::function<void(const DeviceProfile&)> handler) override
+    {
+        handlers.push_back(std::move(handler));
+    }
     void change(DeviceProfile profile)
     {
         current = std::move(profile);
@@ -119,7 +123,8 @@ struct FakeMemoryPressure final : MemoryPressure {
 private:
     struct Registration final : Watch {
         Registration(FakeMemoryPressure& owner_, std::function<void()> critical)
-            : owner(owner_), token(owner.center.observe("critical", [critical = std::move(critical)](auto&) { critical(); }))
+            : owner(owner_),
+              token(owner.center.observe("critical", [critical = std::move(critical)](auto&) { critical(); }))
         {
             ++owner.watchers;
         }

@@ -19,7 +19,7 @@
 #include <openssl/ssl.h>
 #include <openssl/x509v3.h>
 
-#include "platform/Files.h"
+#include "platform/files/Files.h"
 
 namespace platform::test {
 

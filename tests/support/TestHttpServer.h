@@ -10,7 +10,7 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/Url.h"
+#include "platform/net/Url.h"
 
 namespace platform::test {
 

@@ -1,7 +1,5 @@
 #pragma once
 
-#include <gtest/gtest.h>
-
 #include <atomic>
 #include <barrier>
 #include <chrono>
@@ -14,8 +12,12 @@
 #include <thread>
 #include <vector>
 
-#include "platform/Queue.h"
-#include "platform/UrlSession.h"
+#include <gtest/gtest.h>
+
+#include "platform/net/UrlSession.h"
+#include "platform/net/UrlSessionCurl.h"
+#include "platform/run/Queue.h"
+#include "platform/run/WorkerPool.h"
 #include "tests/support/ManualClock.h"
 
 namespace platform::test {

@@ -1,18 +1,20 @@
-#include "CoreTavrin/TAVClient.h"
-
-#include <thread>
-
-#include <gmock/gmock.h>
 #include <sys/mman.h>
+#include <thread>
 #include <unistd.h>
 
+#include <gmock/gmock.h>
+
 #include "CoreTavrin/TAVBag.h"
+#include "CoreTavrin/TAVClient.h"
 #include "CoreTavrin/TAVError.h"
 #include "CoreTavrin/TAVProtocols.h"
 #include "CoreTavrin/TAVReply.h"
 #include "CoreTavrin/TAVRequest.h"
 #include "CoreTavrin/TAVSessionConfiguration.h"
-#include "platform/RunLoop.h"
+#include "platform/ipc/BusTransport.h"
+#include "platform/run/RunLoop.h"
+#include "platform/run/WorkerPool.h"
+#include "platform/values/Dictionary.h"
 #include "searchrecords/ZRRecords.h"
 #include "searchrecords/ZRViewFeedback.h"
 #include "tests/support/ManualClock.h"
@@ -74,7 +76,10 @@ struct EchoDaemon final : TAVDaemonXPC, TAVDiagnosticsXPC, TAVEndpointXPC {
         for (const std::string& event : events) all.push_back(Value::dictionaryOf({{"event", event}}));
         reply(std::move(all), std::nullopt);
     }
-    void listenToFlusher(platform::Reply<std::string> reply) override { reply(flusher ? flusher->endpoint() : "unix:path=/flusher"); }
+    void listenToFlusher(platform::Reply<std::string> reply) override
+    {
+        reply(flusher ? flusher->endpoint() : "unix:path=/flusher");
+    }
     void listSessions(platform::Reply<Value::Array> reply) override
     {
         reply({Value::dictionaryOf({{"identifier", "com.example"}, {"agent", "Example/1"}})});
@@ -202,7 +207,8 @@ TEST_F(ClientTest, EveryOperationCrossesBothWays)
     EXPECT_EQ(view->loadImages({Dictionary{{"id", "a"}}, Dictionary{{"id", "b"}}}, 3ms).value(),
               (std::map<std::string, platform::Bytes>{{"a", platform::Bytes(std::string("\0pixels3000000", 14))},
                                                       {"b", platform::Bytes(std::string("\0pixels3000000", 14))}}));
-    EXPECT_EQ(view->loadImages({Dictionary{{"id", "a"}}}, 2min)->at("a").view().substr(7), "60000000000") << "a minute at most";
+    EXPECT_EQ(view->loadImages({Dictionary{{"id", "a"}}}, 2min)->at("a").view().substr(7), "60000000000")
+        << "a minute at most";
     EXPECT_EQ(view->loadImages({Dictionary{{"id", "a"}}}, -1s)->at("a").view().substr(7), "0");
 }
 

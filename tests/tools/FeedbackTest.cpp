@@ -1,8 +1,10 @@
 #include <gmock/gmock.h>
 
 #include "CoreTavrin/TAVRecordClasses.h"
-#include "platform/Error.h"
-#include "platform/Record.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Error.h"
+#include "platform/values/Json.h"
+#include "platform/values/Record.h"
 #include "searchrecords/ZRRecords.h"
 #include "tools/tavrinctl/Books.h"
 #include "tools/tavrinctl/Events.h"

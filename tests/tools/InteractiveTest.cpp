@@ -27,7 +27,9 @@ TEST(Characters, CountWhatATerminalShows)
               {"東京", 2, 4},
               {"👩‍🚀!", 2, 3},
               {"🇨🇭", 1, 2},
-              {"\xff" "a", 2, 2}};
+              {"\xff"
+               "a",
+               2, 2}};
     for (const auto& c : cases) {
         EXPECT_EQ(charactersOf(c.text).size(), c.characters) << c.text;
         EXPECT_EQ(columnsOf(c.text), c.columns) << c.text;
@@ -52,7 +54,9 @@ TEST(LineEditor, EditsWhatIsTyped)
     const std::pair<std::string_view, std::string_view> cases[]{
         {"weather", "weather|"},
         {"Zürich 東京 👍", "Zürich 東京 👍|"},
-        {"wü\x7f" "e", "we|"},
+        {"wü\x7f"
+         "e",
+         "we|"},
         {"e\u0301\x7f", "|"}, // the accent goes with its letter
         {"\x7f\x08\x15", "|"},
         {"one two \x17", "one |"},
@@ -65,11 +69,13 @@ TEST(LineEditor, EditsWhatIsTyped)
         {"a\033[1;5Cb\033[200~c\033[38;5;1mD", "abcD|"}, // sequences that mean nothing here are skipped whole
         {"a\033b", "ab|"},                               // Esc alone
         {"a\tb", "a b|"},
-        {"a\xc3", "a|"},               // the rest of "ü" may come later
-        {"a\xc3\xc3\xbc", "aü|"},      // a start without its end
-        {"a\xbc\xff\xc0\x80", "a|"},   // no UTF-8
-        {"a\xed\xa0\x80z", "az|"},     // half of a pair
-        {"a\xc2\x9b" "31mb", "a31mb|"}, // a control character of two bytes
+        {"a\xc3", "a|"},             // the rest of "ü" may come later
+        {"a\xc3\xc3\xbc", "aü|"},    // a start without its end
+        {"a\xbc\xff\xc0\x80", "a|"}, // no UTF-8
+        {"a\xed\xa0\x80z", "az|"},   // half of a pair
+        {"a\xc2\x9b"
+         "31mb",
+         "a31mb|"}, // a control character of two bytes
     };
     for (const auto& [keys, line] : cases) EXPECT_EQ(lineAfter(keys), line) << testing::PrintToString(keys);
     EXPECT_EQ(lineAfter(std::string(5000, 'x')).size(), LineEditor::kLongest + 1);
@@ -79,10 +85,9 @@ TEST(LineEditor, EditsWhatIsTyped)
 TEST(LineEditor, TellsWhatAKeyMeans)
 {
     const std::pair<std::string_view, Action> cases[]{
-        {"x", Action::Edited},     {"\x7f", Action::None},      {"\x03", Action::End},    {"\x04", Action::End},
-        {"\x1a", Action::Suspend}, {"\r", Action::Enter},       {"\x0c", Action::Redraw}, {"\033[A", Action::Up},
-        {"\033OB", Action::Down},  {"\033[5~", Action::PageUp}, {"\033[6~", Action::PageDown},
-        {"\033[D", Action::None},
+        {"x", Action::Edited},     {"\x7f", Action::None},      {"\x03", Action::End},         {"\x04", Action::End},
+        {"\x1a", Action::Suspend}, {"\r", Action::Enter},       {"\x0c", Action::Redraw},      {"\033[A", Action::Up},
+        {"\033OB", Action::Down},  {"\033[5~", Action::PageUp}, {"\033[6~", Action::PageDown}, {"\033[D", Action::None},
     };
     for (const auto& [keys, action] : cases) {
         LineEditor line;
@@ -153,7 +158,8 @@ TEST(SearchScreen, MarksWhereAnswersCameFrom)
     EXPECT_THAT(keyLine(exchange), HasSubstr("…")) << "under way";
 
     auto reply = std::make_shared<TAVReply>();
-    reply->rawResponse = platform::Bytes(std::string(R"([{"results": [{"title": "We\u001b[2J", "section_name": "A"}]}])"));
+    reply->rawResponse =
+        platform::Bytes(std::string(R"([{"results": [{"title": "We\u001b[2J", "section_name": "A"}]}])"));
     exchange.answer = TAVAnswer{1, reply, std::nullopt};
     exchange.latency = 12.34;
     EXPECT_EQ(mark(exchange), "answered") << "a reply that isn't verbose doesn't tell";
@@ -162,8 +168,8 @@ TEST(SearchScreen, MarksWhereAnswersCameFrom)
     EXPECT_EQ(describe(exchange)["source"], platform::Value("cache"));
     reply->httpResponse = std::make_shared<TAVHTTPResponse>();
     EXPECT_THAT(keyLine(exchange), HasSubstr("network"));
-    EXPECT_EQ(answerLines(exchange),
-              (std::vector<ScreenLine>{{"A", ScreenLine::Style::Bold}, {"  We [2J"}})) << "drives no terminal";
+    EXPECT_EQ(answerLines(exchange), (std::vector<ScreenLine>{{"A", ScreenLine::Style::Bold}, {"  We [2J"}}))
+        << "drives no terminal";
 
     exchange.answer->reply = nullptr;
     exchange.skipReason = "shorter than the bag's minimum of 4";

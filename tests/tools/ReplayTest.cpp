@@ -1,7 +1,7 @@
 #include <gmock/gmock.h>
 
 #include "CoreTavrin/TAVReply.h"
-#include "platform/Files.h"
+#include "platform/files/Files.h"
 #include "tools/replay/Corpus.h"
 #include "tools/replay/Report.h"
 
@@ -20,8 +20,8 @@ TEST(Corpus, IsReadKeyByKey)
     EXPECT_EQ(queries->front().wanted, "Zü x");
     EXPECT_EQ(queries->front().keys.front().pause, std::chrono::milliseconds(100));
 
-    for (const char* bad : {"a", "a\t", "a\tb", "a\tx:b", "a\t1:", "a\t1:bc", "a\t-1:b", "a\t99999999999:b", "a\t1:\xbc",
-                            "a\t1:a  1:b"})
+    for (const char* bad :
+         {"a", "a\t", "a\tb", "a\tx:b", "a\t1:", "a\t1:bc", "a\t-1:b", "a\t99999999999:b", "a\t1:\xbc", "a\t1:a  1:b"})
         EXPECT_THAT(parseCorpus(std::string("#\n") + bad).error().reason(), HasSubstr("line 2")) << bad;
     EXPECT_FALSE(parseCorpus("a\t" + std::string(4000, ' ')));
 }

@@ -1,12 +1,15 @@
 #include "tools/tavrinctl/Resources.h"
 
 #include <fcntl.h>
-#include <gmock/gmock.h>
 #include <sys/mman.h>
 #include <unistd.h>
 
+#include <gmock/gmock.h>
+
 #include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVError.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "tools/tavrinctl/Tool.h"
 
 namespace tavrin::ctl {

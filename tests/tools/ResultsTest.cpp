@@ -5,6 +5,8 @@
 #include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVError.h"
 #include "CoreTavrin/TAVReply.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "tools/tavrinctl/Tool.h"
 
 namespace tavrin::ctl {

@@ -4,7 +4,8 @@
 
 #include <gmock/gmock.h>
 
-#include "platform/Record.h"
+#include "platform/values/Archive.h"
+#include "platform/values/Record.h"
 
 namespace tavrin::ctl {
 namespace {

@@ -6,6 +6,8 @@
 #include <fmt/format.h>
 #include <fmt/ranges.h>
 
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "tools/devserver/Resources.h"
 
 namespace devserver {

@@ -6,7 +6,8 @@
 #include <mutex>
 #include <string>
 
-#include "platform/Value.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Value.h"
 
 namespace devserver {
 

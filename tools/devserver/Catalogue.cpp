@@ -8,7 +8,8 @@
 #include <fmt/format.h>
 
 #include "catalogue_tables.h"
-#include "platform/Url.h"
+#include "platform/net/Url.h"
+#include "platform/values/Dictionary.h"
 
 namespace devserver {
 namespace {

@@ -1,8 +1,8 @@
 #include "tools/devserver/Certificate.h"
 
+#include <arpa/inet.h>
 #include <memory>
 
-#include <arpa/inet.h>
 #include <fmt/format.h>
 #include <openssl/bio.h>
 #include <openssl/err.h>
@@ -11,7 +11,7 @@
 #include <openssl/rand.h>
 #include <openssl/x509v3.h>
 
-#include "platform/Files.h"
+#include "platform/files/Files.h"
 
 namespace devserver {
 namespace {

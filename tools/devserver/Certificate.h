@@ -5,7 +5,7 @@
 #include <filesystem>
 #include <string>
 
-#include "platform/Date.h"
+#include "platform/base/Date.h"
 
 namespace devserver {
 

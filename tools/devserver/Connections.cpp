@@ -1,14 +1,13 @@
 #include "tools/devserver/Connections.h"
 
+#include <arpa/inet.h>
 #include <charconv>
 #include <filesystem>
+#include <netinet/in.h>
 #include <string>
+#include <sys/socket.h>
 #include <system_error>
 #include <vector>
-
-#include <arpa/inet.h>
-#include <netinet/in.h>
-#include <sys/socket.h>
 
 namespace devserver {
 namespace {

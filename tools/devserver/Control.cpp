@@ -8,7 +8,9 @@
 #include <fmt/format.h>
 #include <fmt/ranges.h>
 
-#include "platform/Error.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Error.h"
+#include "platform/values/Json.h"
 #include "tools/devserver/Service.h"
 
 namespace devserver {

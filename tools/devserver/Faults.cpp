@@ -7,7 +7,9 @@
 #include <fmt/format.h>
 #include <fmt/ranges.h>
 
-#include "platform/Error.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Error.h"
+#include "platform/values/Json.h"
 #include "tools/devserver/Compression.h"
 
 namespace devserver {
@@ -157,8 +159,8 @@ void spoil(Answer& answer, const Fault& fault, const Request& request)
     case Kind::Redirect:
     case Kind::Elsewhere:
         answer = {.status = 302};
-        answer.headers.emplace_back("Location", (fault.kind == Kind::Elsewhere ? otherHost(request) : "") + request.path +
-                                                    (request.query.empty() ? "" : "?" + request.query));
+        answer.headers.emplace_back("Location", (fault.kind == Kind::Elsewhere ? otherHost(request) : "") +
+                                                    request.path + (request.query.empty() ? "" : "?" + request.query));
         return;
     case Kind::GzipBomb:
         answer.body = gzipOfBlanks(fault.number);

@@ -8,7 +8,7 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/Value.h"
+#include "platform/values/Value.h"
 #include "tools/devserver/Http.h"
 
 namespace devserver {

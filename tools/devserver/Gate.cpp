@@ -2,10 +2,9 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <system_error>
-
 #include <poll.h>
 #include <sys/eventfd.h>
+#include <system_error>
 
 namespace devserver {
 namespace {

@@ -5,7 +5,7 @@
 #include <mutex>
 #include <optional>
 
-#include "platform/Files.h"
+#include "platform/files/Files.h"
 
 namespace devserver {
 

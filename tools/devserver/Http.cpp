@@ -1,10 +1,10 @@
 #include "tools/devserver/Http.h"
 
 #include <algorithm>
-
 #include <strings.h>
 
-#include "platform/Url.h"
+#include "platform/net/Url.h"
+#include "platform/values/Json.h"
 
 namespace devserver {
 

@@ -8,7 +8,7 @@
 #include <utility>
 #include <vector>
 
-#include "platform/Value.h"
+#include "platform/values/Value.h"
 
 /// What the service sees of HTTP: requests in, answers out. The library that speaks it stays in HttpServer.cpp.
 namespace devserver {

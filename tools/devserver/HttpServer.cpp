@@ -4,10 +4,10 @@
 #include <atomic>
 #include <cerrno>
 #include <cstring>
+#include <sys/socket.h>
 #include <thread>
 
 #include <httplib.h>
-#include <sys/socket.h>
 
 #include "tools/devserver/Connections.h"
 
@@ -71,11 +71,12 @@ void setStreamedBody(httplib::Response& response, Answer answer)
 void setEndlessBody(httplib::Response& response, Answer answer)
 {
     const std::string type = answer.contentType;
-    response.set_chunked_content_provider(
-        type, [answer = std::move(answer)](std::size_t offset, httplib::DataSink& sink) {
-            if (offset == 0 && !answer.body.empty()) return sink.write(answer.body.data(), answer.body.size());
-            return answer.goesOn() && sink.write(" ", 1);
-        });
+    response.set_chunked_content_provider(type,
+                                          [answer = std::move(answer)](std::size_t offset, httplib::DataSink& sink) {
+                                              if (offset == 0 && !answer.body.empty())
+                                                  return sink.write(answer.body.data(), answer.body.size());
+                                              return answer.goesOn() && sink.write(" ", 1);
+                                          });
 }
 
 void convert(Answer answer, httplib::Response& response)

@@ -4,7 +4,7 @@
 
 #include <CLI/CLI.hpp>
 
-#include "platform/Files.h"
+#include "platform/files/Files.h"
 
 namespace devserver {
 

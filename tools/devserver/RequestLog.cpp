@@ -2,8 +2,9 @@
 
 #include <algorithm>
 #include <chrono>
-
 #include <strings.h>
+
+#include "platform/values/Dictionary.h"
 
 namespace devserver {
 

@@ -7,7 +7,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/Value.h"
+#include "platform/values/Value.h"
 #include "tools/devserver/Http.h"
 
 namespace devserver {

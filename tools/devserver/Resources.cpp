@@ -6,6 +6,8 @@
 #include <fmt/ranges.h>
 
 #include "CoreTavrin/TAVBag.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "tools/devserver/Catalogue.h"
 
 namespace devserver {

@@ -6,7 +6,8 @@
 
 #include <fmt/format.h>
 
-#include "platform/Url.h"
+#include "platform/net/Url.h"
+#include "platform/values/Dictionary.h"
 
 namespace devserver {
 
@@ -211,9 +212,10 @@ std::optional<Value> SearchAnswers::card(std::string_view identifier) const
     Value found = result(*entry, popularityScore(*entry));
     Value::Array posters; // by URL and, where that fails, by identifier
     for (const char* view : {"front", "back"})
-        posters.push_back(Value::dictionaryOf(
-            {{"url", fmt::format("{}/images/{}.{}", _base, platform::percentEncodePathSegment(entry->identifier), view)},
-             {"id", fmt::format("{}.{}", entry->identifier, view)}}));
+        posters.push_back(
+            Value::dictionaryOf({{"url", fmt::format("{}/images/{}.{}", _base,
+                                                     platform::percentEncodePathSegment(entry->identifier), view)},
+                                 {"id", fmt::format("{}.{}", entry->identifier, view)}}));
     found.mutableDictionary().set("posters", std::move(posters));
     found.mutableDictionary().set(
         "card",

@@ -5,7 +5,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/Value.h"
+#include "platform/values/Value.h"
 #include "tools/devserver/Catalogue.h"
 #include "tools/devserver/Matching.h"
 

@@ -5,7 +5,7 @@
 
 #include <fmt/format.h>
 
-#include "platform/Url.h"
+#include "platform/net/Url.h"
 #include "tools/devserver/Control.h"
 #include "tools/devserver/Images.h"
 #include "tools/devserver/Resources.h"

@@ -7,6 +7,9 @@
 #include <fmt/format.h>
 #include <fmt/ranges.h>
 
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
+
 namespace devserver {
 
 using platform::Value;

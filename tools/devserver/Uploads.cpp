@@ -5,7 +5,9 @@
 #include <fmt/format.h>
 #include <openssl/evp.h>
 
-#include "platform/Error.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Error.h"
+#include "platform/values/Json.h"
 #include "tools/devserver/SessionShape.h"
 
 namespace devserver {

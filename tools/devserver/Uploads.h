@@ -8,7 +8,7 @@
 #include <optional>
 #include <string>
 
-#include "platform/Value.h"
+#include "platform/values/Value.h"
 #include "tools/devserver/Http.h"
 #include "tools/shared/Inflate.h"
 

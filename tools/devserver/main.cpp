@@ -8,9 +8,10 @@
 
 #include <fmt/format.h>
 
-#include "platform/Error.h"
-#include "platform/Files.h"
-#include "platform/Value.h"
+#include "platform/files/Files.h"
+#include "platform/values/Error.h"
+#include "platform/values/Json.h"
+#include "platform/values/Value.h"
 #include "tools/devserver/Certificate.h"
 #include "tools/devserver/HttpServer.h"
 #include "tools/devserver/Options.h"

@@ -8,7 +8,7 @@ namespace tavrin::replay {
 
 namespace {
 
-constexpr int kLongestPause = 3'600'000; // milliseconds
+constexpr int kLongestPause = 3'600'000;   // milliseconds
 constexpr std::size_t kLongestText = 1000; // bytes
 
 /// Cuts the part before the first `end` off the front of `text`; all of it where there is none.
@@ -44,10 +44,14 @@ std::string addKey(std::string_view token, TypedQuery& query)
         return fmt::format("\"{}\" is no PAUSE:KEY", token);
     const std::string_view key = token.substr(digits + 1);
     std::string text = query.keys.empty() ? "" : query.keys.back().text;
-    if (key == "⌫") removeLastCharacter(text);
-    else if (key == "␣") text += ' ';
-    else if (isOneCharacter(key)) text += key;
-    else return fmt::format("\"{}\" is no key", key);
+    if (key == "⌫")
+        removeLastCharacter(text);
+    else if (key == "␣")
+        text += ' ';
+    else if (isOneCharacter(key))
+        text += key;
+    else
+        return fmt::format("\"{}\" is no key", key);
     if (text.size() > kLongestText) return fmt::format("more than {} bytes are typed", kLongestText);
     query.keys.push_back({std::chrono::milliseconds(pause), std::move(text)});
     return {};

@@ -5,15 +5,15 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/Error.h"
+#include "platform/values/Error.h"
 
 /// What users typed, key by key, as a text file: a line for each query,
 ///
 ///     WANTED <tab> PAUSE:KEY PAUSE:KEY …
 ///
 /// where WANTED is what the user had in mind, for readers of the file; PAUSE is the time since the key before, in
-/// milliseconds; and KEY the character that was typed: "␣" for a blank, "⌫" where the last one was taken back. Every query
-/// begins with an empty line of input. Lines that begin with "#" are comments.
+/// milliseconds; and KEY the character that was typed: "␣" for a blank, "⌫" where the last one was taken back. Every
+/// query begins with an empty line of input. Lines that begin with "#" are comments.
 namespace tavrin::replay {
 
 struct Keystroke {

@@ -6,8 +6,10 @@
 #include <fmt/format.h>
 
 #include "CoreTavrin/TAVReply.h"
-#include "platform/Text.h"
-#include "platform/Url.h"
+#include "platform/net/Url.h"
+#include "platform/text/Text.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 
 namespace tavrin::replay {
 
@@ -73,7 +75,8 @@ void Report::add(const Search& search, const platform::Result<TAVAnswer>& answer
                                       answer ? answer->error->reason() : answer.error().reason()));
         break;
     case Kind::Empty:
-        if (search.tooShort) ++_skipped;
+        if (search.tooShort)
+            ++_skipped;
         else if (!search.overtaken)
             _failed.push_back(fmt::format("\"{}\" ({}): empty, without a reason", search.text, search.queryId));
         else {

@@ -7,14 +7,14 @@
 #include <vector>
 
 #include "CoreTavrin/TAVClient.h"
-#include "platform/Value.h"
+#include "platform/values/Value.h"
 
 namespace tavrin::replay {
 
 enum class Kind {
-    Cache,     ///< answered from memory
-    Network,   ///< answered by the service
-    Empty,     ///< neither reply nor error: too short, switched off, or overtaken
+    Cache,   ///< answered from memory
+    Network, ///< answered by the service
+    Empty,   ///< neither reply nor error: too short, switched off, or overtaken
     Failed,
 };
 
@@ -30,8 +30,8 @@ struct Search {
 
 [[nodiscard]] Kind kindOf(const platform::Result<TAVAnswer>& answer);
 
-/// Keeps account of the answers to one connection's searches, which are verbose, and finds those that should never have been
-/// delivered. Times come from the caller.
+/// Keeps account of the answers to one connection's searches, which are verbose, and finds those that should never have
+/// been delivered. Times come from the caller.
 class Report {
 public:
     /// Answers are to be added as they come.
@@ -58,7 +58,7 @@ private:
     std::uint64_t _keys = 0;
     std::uint64_t _skipped = 0;
     std::uint64_t _overtaken = 0;
-    std::vector<double> _cache;   // latencies in seconds
+    std::vector<double> _cache; // latencies in seconds
     std::vector<double> _network;
     std::vector<std::string> _stale;
     std::vector<std::string> _failed;

@@ -13,8 +13,9 @@
 #include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVRequest.h"
 #include "CoreTavrin/TAVSessionConfiguration.h"
-#include "platform/Files.h"
-#include "platform/Text.h"
+#include "platform/files/Files.h"
+#include "platform/text/Text.h"
+#include "platform/values/Json.h"
 #include "tools/replay/Corpus.h"
 #include "tools/replay/Report.h"
 
@@ -126,7 +127,8 @@ int run(const Options& options)
     auto queries = valueOf(parseCorpus(bytes.view()), options.corpus);
     if (options.queries > 0 && options.queries < queries.size()) queries.resize(options.queries);
     const Report report = Replay(options).run(queries);
-    fmt::print("{}", options.json ? platform::toJson(report.json(), platform::JsonStyle::Pretty) + "\n" : report.text());
+    fmt::print("{}",
+               options.json ? platform::toJson(report.json(), platform::JsonStyle::Pretty) + "\n" : report.text());
     return report.stale().empty() && report.failed().empty() ? EXIT_SUCCESS : EXIT_FAILURE;
 }
 
@@ -137,8 +139,9 @@ int main(int argc, char** argv)
 {
     using namespace tavrin::replay;
     Options options;
-    CLI::App app("Types a corpus of queries into the daemon, key by key, and reports hits, requests saved, stale answers and "
-                 "latencies. Ends with 1 where an answer was stale or failed.");
+    CLI::App app(
+        "Types a corpus of queries into the daemon, key by key, and reports hits, requests saved, stale answers and "
+        "latencies. Ends with 1 where an answer was stale or failed.");
     app.add_option("corpus", options.corpus, "The corpus: tools/replay/corpus.txt, or one of its form")->required();
     app.add_option("--address", options.address, "The daemon's D-Bus address")->capture_default_str();
     app.add_option("--identifier", options.identifier, "Client identifier to introduce oneself with")

@@ -8,9 +8,9 @@
 #include <fmt/chrono.h>
 #include <fmt/format.h>
 
-#include "platform/AppActivities.h"
-#include "platform/Files.h"
-#include "platform/UrlScheme.h"
+#include "platform/device/AppActivities.h"
+#include "platform/files/Files.h"
+#include "platform/net/UrlScheme.h"
 #include "tools/tavrinctl/Commands.h"
 
 namespace tavrin::ctl {

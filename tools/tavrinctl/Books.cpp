@@ -6,6 +6,7 @@
 #include <fmt/format.h>
 #include <fmt/ranges.h>
 
+#include "platform/values/Dictionary.h"
 #include "tools/tavrinctl/Tool.h"
 
 namespace tavrin::ctl {

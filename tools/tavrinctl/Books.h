@@ -3,7 +3,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/Value.h"
+#include "platform/values/Value.h"
 
 namespace tavrin::ctl {
 

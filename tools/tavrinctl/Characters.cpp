@@ -16,8 +16,7 @@ int columnsOfCodePoint(UChar32 c)
     const int category = u_charType(c);
     if (category == U_NON_SPACING_MARK || category == U_ENCLOSING_MARK || category == U_FORMAT_CHAR) return 0;
     const int width = u_getIntPropertyValue(c, UCHAR_EAST_ASIAN_WIDTH);
-    const bool wide =
-        width == U_EA_WIDE || width == U_EA_FULLWIDTH || u_hasBinaryProperty(c, UCHAR_EMOJI_PRESENTATION);
+    const bool wide = width == U_EA_WIDE || width == U_EA_FULLWIDTH || u_hasBinaryProperty(c, UCHAR_EMOJI_PRESENTATION);
     return wide ? 2 : 1;
 }
 
@@ -47,7 +46,8 @@ std::vector<Character> charactersOf(std::string_view text)
     std::vector<Character> characters;
     if (U_SUCCESS(status)) {
         std::int32_t begin = boundaries->first();
-        for (std::int32_t end = boundaries->next(); end != icu::BreakIterator::DONE; begin = end, end = boundaries->next()) {
+        for (std::int32_t end = boundaries->next(); end != icu::BreakIterator::DONE;
+             begin = end, end = boundaries->next()) {
             const auto bytes = text.substr(static_cast<std::size_t>(begin), static_cast<std::size_t>(end - begin));
             characters.push_back({bytes, columnsOfCharacter(bytes)});
         }

@@ -6,9 +6,11 @@
 #include <CLI/CLI.hpp>
 #include <fmt/format.h>
 
-#include "platform/Files.h"
-#include "platform/Log.h"
-#include "platform/UserDefaults.h"
+#include "platform/base/Log.h"
+#include "platform/files/Files.h"
+#include "platform/files/UserDefaults.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "tools/tavrinctl/Commands.h"
 
 namespace tavrin::ctl {

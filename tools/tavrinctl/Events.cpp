@@ -6,8 +6,10 @@
 #include <fmt/format.h>
 #include <fmt/ranges.h>
 
-#include "platform/Error.h"
-#include "platform/Text.h"
+#include "platform/text/Text.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Error.h"
+#include "platform/values/Json.h"
 #include "tools/shared/Inflate.h"
 #include "tools/tavrinctl/Tool.h"
 

@@ -4,8 +4,9 @@
 #include <string>
 #include <string_view>
 
-#include "platform/Bytes.h"
-#include "platform/Value.h"
+#include "platform/base/Bytes.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Value.h"
 
 /// Feedback as people read it: short lines, safe for a terminal.
 namespace tavrin::ctl {

@@ -9,6 +9,8 @@
 #include <fmt/ranges.h>
 
 #include "CoreTavrin/TAVBag.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "tools/tavrinctl/Commands.h"
 #include "tools/tavrinctl/Events.h"
 #include "tools/tavrinctl/FeedbackRecords.h"
@@ -71,7 +73,8 @@ void send(const Options& options, const std::string& file)
     const std::vector<ReportedEvent> events = eventsInFile(file);
     const Session session = openSession(options);
     if (const auto bag = session.client->bag(); bag && bag->bag && !bag->bag->feedbackEnabled())
-        fmt::print(stderr, "tavrinctl: the bag has feedback switched off for {}: the daemon drops them\n", options.agent);
+        fmt::print(stderr, "tavrinctl: the bag has feedback switched off for {}: the daemon drops them\n",
+                   options.agent);
 
     std::size_t out = 0, taken = 0;
     std::string refusal;

@@ -6,7 +6,9 @@
 #include <fmt/format.h>
 
 #include "CoreTavrin/TAVRecordClasses.h"
-#include "platform/Record.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Record.h"
+#include "platform/values/ValueCoder.h"
 
 namespace tavrin::ctl {
 

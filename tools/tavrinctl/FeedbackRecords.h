@@ -6,7 +6,8 @@
 #include <string>
 #include <vector>
 
-#include "platform/Value.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Value.h"
 #include "searchrecords/ZRFeedback.h"
 
 /// Feedback records that somebody wrote as JSON.

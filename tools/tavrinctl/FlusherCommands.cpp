@@ -12,7 +12,8 @@
 #include <fmt/format.h>
 
 #include "CoreTavrin/TAVProtocols.h"
-#include "platform/Files.h"
+#include "platform/files/Files.h"
+#include "platform/values/Json.h"
 #include "tools/tavrinctl/Commands.h"
 #include "tools/tavrinctl/Events.h"
 
@@ -55,7 +56,7 @@ void endOnSignal()
 {
     static std::array<char, 1u << 20> buffer; // a line is one write, which a signal doesn't divide
     std::setvbuf(stdout, buffer.data(), _IOFBF, buffer.size());
-    struct sigaction action {};
+    struct sigaction action{};
     action.sa_handler = [](int) { _exit(EXIT_SUCCESS); };
     for (const int signal : {SIGINT, SIGTERM}) sigaction(signal, &action, nullptr);
 }

@@ -4,8 +4,8 @@
 
 #include <fmt/format.h>
 
-#include "platform/Files.h"
-#include "platform/Url.h"
+#include "platform/files/Files.h"
+#include "platform/net/Url.h"
 #include "tools/tavrinctl/Tool.h"
 
 namespace tavrin::ctl {

@@ -5,7 +5,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/Bytes.h"
+#include "platform/base/Bytes.h"
 
 namespace platform {
 class FileSystem;

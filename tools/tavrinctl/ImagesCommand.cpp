@@ -8,7 +8,9 @@
 
 #include "CoreTavrin/ResponseImages.h"
 #include "CoreTavrin/TAVRequest.h"
-#include "platform/Files.h"
+#include "platform/files/Files.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "tools/tavrinctl/Commands.h"
 #include "tools/tavrinctl/ImageFiles.h"
 #include "tools/tavrinctl/RequestRunner.h"

@@ -9,6 +9,8 @@
 #include <fmt/format.h>
 
 #include "CoreTavrin/TAVBag.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "tools/tavrinctl/Books.h"
 #include "tools/tavrinctl/Commands.h"
 

@@ -76,10 +76,7 @@ private:
         return false;
     }
 
-    void scrollTo(std::size_t line)
-    {
-        _scrolled = std::min(line, _answer.size() - std::min(_answer.size(), room()));
-    }
+    void scrollTo(std::size_t line) { _scrolled = std::min(line, _answer.size() - std::min(_answer.size(), room())); }
     [[nodiscard]] std::size_t room() const { return answerRows(_keys.size(), _terminal.size()); }
 
     void search()
@@ -129,7 +126,7 @@ private:
     Terminal _terminal;
     LineEditor _line;
     std::shared_ptr<Exchange> _wanted; // the latest key's
-    std::deque<Key> _keys; // the newest last
+    std::deque<Key> _keys;             // the newest last
     std::vector<ScreenLine> _answer;
     std::size_t _scrolled = 0;
     bool _changed = true;

@@ -106,8 +106,10 @@ LineEditor::Action LineEditor::sequence(char final)
 /// Keeps the bytes of a character until it is whole. One that can't become whole is dropped.
 LineEditor::Action LineEditor::utf8(unsigned char byte)
 {
-    if (byte < 0x80 || U8_IS_LEAD(byte)) _pending.clear();
-    else if (_pending.empty()) return Action::None;
+    if (byte < 0x80 || U8_IS_LEAD(byte))
+        _pending.clear();
+    else if (_pending.empty())
+        return Action::None;
     _pending += static_cast<char>(byte);
 
     const auto* bytes = reinterpret_cast<const std::uint8_t*>(_pending.data());

@@ -8,8 +8,8 @@ namespace tavrin::ctl {
 
 /// A line that is typed into a terminal, byte by byte as the terminal sends it.
 ///
-/// Takes UTF-8 and drops what is none. Knows Backspace, Delete, Left, Right, Home, End and their Ctrl- forms, Ctrl-U (up to
-/// the cursor), Ctrl-K (from there) and Ctrl-W (a word back); what else a key may send is skipped whole.
+/// Takes UTF-8 and drops what is none. Knows Backspace, Delete, Left, Right, Home, End and their Ctrl- forms, Ctrl-U
+/// (up to the cursor), Ctrl-K (from there) and Ctrl-W (a word back); what else a key may send is skipped whole.
 class LineEditor {
 public:
     /// Longer lines take no more.

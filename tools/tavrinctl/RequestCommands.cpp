@@ -4,6 +4,7 @@
 #include <fmt/format.h>
 
 #include "CoreTavrin/TAVRequest.h"
+#include "platform/values/Dictionary.h"
 #include "searchrecords/ZRViewFeedback.h"
 #include "tools/tavrinctl/Commands.h"
 #include "tools/tavrinctl/RequestRunner.h"
@@ -87,8 +88,10 @@ void warm(const Options& options)
     appeared.viewAppearEvent = SearchViewAppearTrigger::KeyboardShortcut;
     session.client->reportEvent("searchViewDidAppear", 0, appeared);
     (void)valueOf(session.client->status()); // calls are taken in order: the event has been, by now
-    if (options.json) printJson(platform::Dictionary{{"reported", appeared.className()}});
-    else printLine("The search view has appeared; the daemon's log tells whether the connection was warm already.");
+    if (options.json)
+        printJson(platform::Dictionary{{"reported", appeared.className()}});
+    else
+        printLine("The search view has appeared; the daemon's log tells whether the connection was warm already.");
 }
 
 } // namespace
@@ -98,7 +101,6 @@ void addOtherRequestCommands(CLI::App& app, Command& chosen)
     app.add_subcommand("warm", "Open the connection to the service ahead of a search")->callback([&chosen] {
         chosen = warm;
     });
-
 
     const auto onChosen = [&chosen](CLI::App* command, auto action) {
         command->callback(
@@ -115,7 +117,8 @@ void addOtherRequestCommands(CLI::App& app, Command& chosen)
     const auto addFollowing = [&](const char* name, const char* description, auto follow) {
         auto options = std::make_shared<RequestOptions>();
         CLI::App* command = add(app, name, description, options);
-        command->add_option("what", options->what, "The URL in an earlier answer, or a query to search for first")->required();
+        command->add_option("what", options->what, "The URL in an earlier answer, or a query to search for first")
+            ->required();
         command->add_flag("--endpoint", options->endpoint, "Ask over the endpoint, not the connection");
         onChosen(command, [options, follow](const Options& common) { return follow(common, *options); });
     };

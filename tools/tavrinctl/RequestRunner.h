@@ -25,8 +25,8 @@ public:
     using Shown = std::function<void(const Exchange&)>;
     /// Sends a request; `answered` is called when its answer is there, inside one of the waiting calls below.
     std::shared_ptr<Exchange> send(TAVRequest& request, std::string query, Shown answered = {});
-    /// Takes answers until `done()`, which is asked again after each of them, and whenever `descriptor` can be read. False:
-    /// the daemon closed the connection.
+    /// Takes answers until `done()`, which is asked again after each of them, and whenever `descriptor` can be read.
+    /// False: the daemon closed the connection.
     [[nodiscard]] bool takeAnswers(const std::function<bool()>& done, int descriptor);
     /// Takes answers for a while.
     void pause(std::chrono::duration<double, std::milli> duration);

@@ -8,7 +8,7 @@
 #include <fmt/format.h>
 
 #include "CoreTavrin/TAVBag.h"
-#include "platform/Files.h"
+#include "platform/files/Files.h"
 #include "tools/tavrinctl/Commands.h"
 #include "tools/tavrinctl/Resources.h"
 

@@ -11,6 +11,7 @@
 
 #include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVError.h"
+#include "platform/values/Dictionary.h"
 #include "tools/tavrinctl/Tool.h"
 
 namespace tavrin::ctl {

@@ -3,6 +3,7 @@
 #include <string>
 
 #include "CoreTavrin/TAVClient.h"
+#include "platform/values/Dictionary.h"
 
 namespace tavrin::ctl {
 

@@ -9,7 +9,10 @@
 #include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVError.h"
 #include "CoreTavrin/TAVReply.h"
-#include "platform/Text.h"
+#include "platform/text/Text.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
+#include "platform/values/ValueCoder.h"
 #include "tools/tavrinctl/Characters.h"
 #include "tools/tavrinctl/Tool.h"
 

@@ -4,7 +4,7 @@
 #include <vector>
 
 #include "CoreTavrin/TAVClient.h"
-#include "platform/Value.h"
+#include "platform/values/Value.h"
 
 namespace tavrin::ctl {
 
@@ -27,7 +27,7 @@ struct Exchange {
     std::optional<TAVAnswer> answer; ///< none: no answer in time, or the connection ended
     std::string problem;             ///< what happened instead of an answer
 
-    bool showHttp = false;           ///< the HTTP request and response are to be shown
+    bool showHttp = false; ///< the HTTP request and response are to be shown
 
     [[nodiscard]] Outcome outcome() const;
     [[nodiscard]] bool waiting() const { return !answer && problem.empty(); }
@@ -60,8 +60,8 @@ struct ListedResult {
 [[nodiscard]] platform::Value describe(const Exchange& exchange);
 /// One line: what was asked, what became of it, how long it took.
 [[nodiscard]] std::string summary(const Exchange& exchange);
-/// Results by section, suggestions, and the HTTP request and response where they are to be shown. At most `limit` results;
-/// 0 is all.
+/// Results by section, suggestions, and the HTTP request and response where they are to be shown. At most `limit`
+/// results; 0 is all.
 void printAnswer(const Exchange& exchange, std::size_t limit);
 
 } // namespace tavrin::ctl

@@ -77,8 +77,8 @@ void addSearchCommand(CLI::App& app, Command& chosen)
     auto options = std::make_shared<SearchOptions>();
     CLI::App* command = app.add_subcommand("search", "Search, once or as a user types");
     command->add_option("query", options->query, "What to search for; with --interactive, what to begin with");
-    CLI::Option* interactive =
-        command->add_flag("-i,--interactive", options->interactive, "Type in the terminal, and see what every key brings");
+    CLI::Option* interactive = command->add_flag("-i,--interactive", options->interactive,
+                                                 "Type in the terminal, and see what every key brings");
     command->add_flag("--typed", options->typed, "Send a request for each key, without waiting for the answers")
         ->excludes(interactive);
     command->add_option("--interval", options->interval, "Milliseconds between keys")

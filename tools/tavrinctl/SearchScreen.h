@@ -36,8 +36,8 @@ struct ScreenFrame {
     int cursorColumn = 0; ///< in the first line; the first is 0
 };
 
-/// Lays the view out. What doesn't fit is left out: keys first, then results; the line that is typed is always there, the
-/// part around the cursor where it is too long.
+/// Lays the view out. What doesn't fit is left out: keys first, then results; the line that is typed is always there,
+/// the part around the cursor where it is too long.
 [[nodiscard]] ScreenFrame layOut(const SearchView& view, ScreenSize size);
 /// How many lines of the answer there is room for.
 [[nodiscard]] std::size_t answerRows(std::size_t keys, ScreenSize size);

@@ -4,6 +4,8 @@
 #include <fmt/chrono.h>
 #include <fmt/format.h>
 
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "tools/tavrinctl/Commands.h"
 #include "tools/tavrinctl/Events.h"
 #include "tools/tavrinctl/SessionFile.h"

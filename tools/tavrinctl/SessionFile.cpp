@@ -5,7 +5,8 @@
 
 #include <fmt/format.h>
 
-#include "platform/Record.h"
+#include "platform/values/Archive.h"
+#include "platform/values/Record.h"
 
 namespace tavrin::ctl {
 

@@ -6,7 +6,7 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/Value.h"
+#include "platform/values/Value.h"
 
 namespace tavrin::ctl {
 

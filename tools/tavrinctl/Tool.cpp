@@ -6,7 +6,8 @@
 
 #include <fmt/format.h>
 
-#include "platform/Files.h"
+#include "platform/files/Files.h"
+#include "platform/values/Json.h"
 
 namespace tavrin::ctl {
 

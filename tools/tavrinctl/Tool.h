@@ -7,7 +7,7 @@
 
 #include "CoreTavrin/TAVClient.h"
 #include "CoreTavrin/TAVSessionConfiguration.h"
-#include "platform/Value.h"
+#include "platform/values/Value.h"
 
 namespace tavrin::ctl {
 

@@ -1,0 +1,1 @@
+// Compiled for its precompiled headers; see Layers.cmake.

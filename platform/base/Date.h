@@ -1,0 +1,47 @@
+#pragma once
+
+#include <chrono>
+#include <cmath>
+#include <cstdint>
+
+namespace platform {
+
+/// A moment on the system clock, as read from `Clock::wallNow()`.
+using Date = std::chrono::sys_time<std::chrono::nanoseconds>;
+
+/// A span of time.
+using Duration = std::chrono::nanoseconds;
+
+// Whole seconds and the rest apart: nanoseconds since 1970 are more than a double holds exactly.
+
+/// The seconds nearest to `d`.
+[[nodiscard]] inline double toSeconds(Duration d)
+{
+    const auto whole = std::chrono::duration_cast<std::chrono::seconds>(d);
+    return static_cast<double>(whole.count()) + std::chrono::duration<double>(d - whole).count();
+}
+
+/// Seconds since 1970, UTC.
+[[nodiscard]] inline double secondsSince1970(Date date)
+{
+    return toSeconds(date.time_since_epoch());
+}
+
+/// The span nearest to `seconds`. Values beyond what nanoseconds hold (292 years) are clamped, NaN is zero.
+[[nodiscard]] inline Duration durationFromSeconds(double seconds)
+{
+    constexpr double kLimit = 9.2e9;
+    if (!(seconds == seconds)) return Duration::zero();
+    if (seconds > kLimit) seconds = kLimit;
+    if (seconds < -kLimit) seconds = -kLimit;
+    const double whole = std::trunc(seconds);
+    return std::chrono::seconds(static_cast<std::int64_t>(whole)) + Duration(std::llround((seconds - whole) * 1e9));
+}
+
+/// The moment `seconds` after 1970, clamped like `durationFromSeconds`.
+[[nodiscard]] inline Date dateFromSecondsSince1970(double seconds)
+{
+    return Date(durationFromSeconds(seconds));
+}
+
+} // namespace platform

@@ -1,0 +1,36 @@
+#include "platform/device/ActivityPolicy.h"
+
+#include <algorithm>
+
+namespace platform {
+
+bool criteriaHold(const ActivityCriteria& criteria, const DeviceUse& use)
+{
+    return (criteria.allowBattery || !use.onBattery) && (!criteria.requireScreenSleep || !use.screenInUse) &&
+           (!criteria.requireFirstUnlock || use.unlocked);
+}
+
+bool dependOnUse(const ActivityCriteria& criteria)
+{
+    return !criteria.allowBattery || criteria.requireScreenSleep || criteria.requireFirstUnlock;
+}
+
+std::optional<Duration> wakeTime(std::span<const ActivityWindow> windows)
+{
+    if (windows.empty()) return std::nullopt;
+    Duration latest = Duration::max();
+    for (const ActivityWindow& window : windows) latest = std::min(latest, window.due + window.gracePeriod);
+    Duration wake = Duration::min();
+    for (const ActivityWindow& window : windows)
+        if (window.due <= latest) wake = std::max(wake, window.due);
+    return wake;
+}
+
+Duration firstDue(const ActivityCriteria& criteria, Duration registered, std::optional<Duration> kept)
+{
+    const Duration earliest = registered + criteria.delay;
+    if (!kept || !criteria.repeating) return earliest;
+    return std::max(earliest, std::min(*kept, registered + criteria.interval));
+}
+
+} // namespace platform

@@ -1,0 +1,47 @@
+#pragma once
+
+#include <cstddef>
+#include <filesystem>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/base/Date.h"
+#include "platform/values/Error.h"
+
+namespace platform {
+
+/// Something that the user did in an application, as the application told it.
+struct AppActivity {
+    Date start; ///< whole seconds
+    std::string bundleIdentifier;
+    std::optional<std::string> relatedUniqueIdentifier;
+    std::optional<std::string> contentUrl;
+    bool publiclyIndexable = false; ///< whether its content is open to everyone
+};
+
+/// What the user does in applications: a database (docs/formats.md) that applications add to and the daemon only reads.
+/// It is opened for each call, and nothing is kept of it in between. Any thread.
+class AppActivities {
+public:
+    /// Those that began earlier are forgotten when one is added.
+    static constexpr auto kKeptFor = std::chrono::days(7);
+
+    /// `directory` holds the database; it need not be there.
+    explicit AppActivities(const std::filesystem::path& directory) : _path(directory / "app-activities.db") {}
+
+    /// The activities that began from `from` to `to`, both included, by date; those of a second in the order in which
+    /// they were added. The first `limit` of them. Reading waits for nobody: a database that isn't there, is locked,
+    /// damaged or of another make is an error at once.
+    [[nodiscard]] Result<std::vector<AppActivity>> queryAppActivitiesAfterDate(Date from, Date to,
+                                                                               std::size_t limit) const;
+
+    /// Adds one, and makes the database and its directory where there are none. Waits up to a second for others that
+    /// add. An error for an activity that would be forgotten at once.
+    [[nodiscard]] Result<void> add(const AppActivity& activity, Date now) const;
+
+private:
+    std::filesystem::path _path;
+};
+
+} // namespace platform

@@ -1,0 +1,32 @@
+#include "platform/device/Device.h"
+
+namespace platform {
+
+std::shared_ptr<Queue> Device::serialQueue(std::string label, Priority priority) const
+{
+    return Queue::make(std::move(label), Queue::Kind::Serial, executor, clock, priority);
+}
+
+std::shared_ptr<Queue> Device::concurrentQueue(std::string label, Priority priority) const
+{
+    return Queue::make(std::move(label), Queue::Kind::Concurrent, executor, clock, priority);
+}
+
+std::shared_ptr<Queue> Device::globalQueue(Priority priority) const
+{
+    return globalQueues[static_cast<std::size_t>(priority)];
+}
+
+std::shared_ptr<Queue> Device::mainQueue() const
+{
+    return main;
+}
+
+void Device::makeQueues()
+{
+    globalQueues = {concurrentQueue("global.background", Priority::Background), concurrentQueue("global.default"),
+                    concurrentQueue("global.high", Priority::High)};
+    main = Queue::make("main", Queue::Kind::Serial, mainExecutor, clock);
+}
+
+} // namespace platform

@@ -1,0 +1,81 @@
+#pragma once
+
+#include <array>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "platform/device/SystemNotifier.h"
+#include "platform/files/Files.h"
+#include "platform/run/Queue.h"
+
+namespace platform {
+
+class ActivityScheduler;
+class BackgroundSessions;
+class Clock;
+class CounterStore;
+class DataDetectorStore;
+class DeviceProfileSource;
+class InstalledApplications;
+class LocaleSource;
+class LocationSource;
+class MemoryPressure;
+class NetworkStatus;
+class NotificationCenter;
+class ProcessIdentity;
+class RunLoop;
+class SubscriptionServices;
+class SystemNotifier;
+class Transactions;
+class UrlLoader;
+class UserDefaults;
+namespace ipc {
+class Transport;
+}
+
+/// The device that the daemon runs on: what a service needs from outside, by role. Plain references, set once and never
+/// null; whoever makes a Device keeps its parts alive longer than every service. tests/support has one of twins.
+struct Device {
+    Clock& clock;
+    Executor& executor;     ///< worker threads
+    Executor& mainExecutor; ///< the main thread's run loop
+    FileSystem& files;
+    Directories directories;
+    UserDefaults& userDefaults;   ///< the daemon's own suite
+    UserDefaults& lookupDefaults; ///< the suite shared with lookup clients
+    NotificationCenter& notifications;
+    CounterStore& counters;
+    Transactions& transactions;
+    LocaleSource& locale;
+    LocationSource& location;
+    DeviceProfileSource& profile;
+    InstalledApplications& applications;
+    SubscriptionServices& subscriptions;
+    DataDetectorStore& dataDetectors;
+    ProcessIdentity& processes;
+    MemoryPressure& memoryPressure;
+    SystemNotifier& systemNotifier;
+    UrlLoader& urlLoader;
+    NetworkStatus& network;
+    BackgroundSessions& backgroundSessions;
+    ActivityScheduler& activities;
+    ipc::Transport& ipc;
+    std::vector<std::string>
+        launchEvents{}; ///< names of what the service manager started the process for: units, sockets
+
+    [[nodiscard]] std::shared_ptr<Queue> serialQueue(std::string label, Priority priority = Priority::Default) const;
+    [[nodiscard]] std::shared_ptr<Queue> concurrentQueue(std::string label,
+                                                         Priority priority = Priority::Default) const;
+    /// A shared concurrent queue of that priority, for work that guards no state.
+    [[nodiscard]] std::shared_ptr<Queue> globalQueue(Priority priority) const;
+    /// Tasks on the main thread.
+    [[nodiscard]] std::shared_ptr<Queue> mainQueue() const;
+
+    std::array<std::shared_ptr<Queue>, 3> globalQueues{}; ///< by Priority; made by makeQueues
+    std::shared_ptr<Queue> main{};
+    /// Makes the two above; whoever fills in a Device calls it once.
+    void makeQueues();
+};
+
+} // namespace platform

@@ -1,0 +1,170 @@
+#include "platform/files/Counters.h"
+
+#include <atomic>
+#include <cerrno>
+#include <mutex>
+#include <shared_mutex>
+#include <unordered_map>
+
+#include <fmt/format.h>
+
+#include "platform/base/Log.h"
+#include "platform/files/Files.h"
+#include "platform/run/Queue.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
+#include "platform/values/Value.h"
+
+namespace platform {
+
+namespace {
+
+constexpr std::chrono::seconds kBatch{60};
+/// Keys are built from clients' names and agents: a hostile one must not fill the memory.
+constexpr std::size_t kMaximumCounters = 4096;
+constexpr std::size_t kMaximumKeyLength = 512;
+/// As many counters as there may be, with keys of escapes ("\u0001") and numbers of 20 digits, can be read back.
+constexpr std::size_t kMaximumSize = kMaximumCounters * (6 * kMaximumKeyLength + 32);
+
+struct KeyHash {
+    using is_transparent = void;
+    std::size_t operator()(std::string_view key) const { return std::hash<std::string_view>()(key); }
+};
+
+} // namespace
+
+struct CounterStore::Impl : std::enable_shared_from_this<Impl> {
+    FileSystem* files = nullptr; // null: in memory only
+    std::filesystem::path path;
+    std::shared_ptr<Queue> writeQueue;
+
+    mutable std::shared_mutex mutex;
+    std::unordered_map<std::string, std::atomic<std::int64_t>, KeyHash, std::equal_to<>> counters; // under the mutex
+    std::atomic<bool> writeQueued = false;
+
+    /// Calls `change` with the counter, made if it isn't there.
+    template <class Change> void with(std::string_view key, Change change)
+    {
+        {
+            std::shared_lock lock(mutex);
+            if (const auto found = counters.find(key); found != counters.end()) {
+                change(found->second);
+                lock.unlock();
+                return changed();
+            }
+        }
+        {
+            std::unique_lock lock(mutex);
+            if (counters.size() >= kMaximumCounters || key.size() > kMaximumKeyLength) return;
+            change(counters.try_emplace(std::string(key), 0).first->second);
+        }
+        changed();
+    }
+
+    void changed()
+    {
+        if (!files || writeQueued.exchange(true)) return;
+        writeQueue->after(kBatch, [self = shared_from_this()] {
+            self->writeQueued = false;
+            self->write();
+        });
+    }
+
+    std::map<std::string, std::int64_t> snapshot() const
+    {
+        std::shared_lock lock(mutex);
+        return {counters.begin(), counters.end()};
+    }
+
+    void write() const
+    {
+        Dictionary contents;
+        for (const auto& [key, count] : snapshot()) contents.set(key, count);
+        auto made = files->createDirectories(path.parent_path());
+        auto written = made ? files->writeAtomically(path, toJson(contents)) : std::move(made);
+        if (!written) defaultLog().error("counters can't be written: {}", written.error().description());
+    }
+
+    void load()
+    {
+        auto bytes = files->read(path, kMaximumSize);
+        if (!bytes) {
+            if (bytes.error().code != ENOENT)
+                defaultLog().error("counters can't be read: {}", bytes.error().description());
+            return;
+        }
+        const auto contents = parseJson(bytes->view(), kMaximumSize);
+        if (!contents || !contents->asDictionary())
+            return defaultLog().error("counters {} are broken, starting at 0", path.string());
+        std::unique_lock lock(mutex);
+        for (const auto& [key, count] : *contents->asDictionary())
+            if (const auto number = count.asInt(); number && counters.size() < kMaximumCounters)
+                counters.try_emplace(key, *number);
+    }
+};
+
+CounterStore::CounterStore() : _impl(std::make_shared<Impl>()) {}
+
+CounterStore::CounterStore(FileSystem& files, std::filesystem::path path, std::shared_ptr<Queue> writeQueue)
+    : CounterStore()
+{
+    _impl->files = &files;
+    _impl->path = std::move(path);
+    _impl->writeQueue = std::move(writeQueue);
+    _impl->load();
+}
+
+CounterStore::~CounterStore() = default;
+
+void CounterStore::add(std::string_view key, std::int64_t amount)
+{
+    _impl->with(key, [amount](auto& counter) { counter.fetch_add(amount, std::memory_order_relaxed); });
+}
+
+void CounterStore::set(std::string_view key, std::int64_t value)
+{
+    _impl->with(key, [value](auto& counter) { counter = value; });
+}
+
+void CounterStore::clear(std::string_view key)
+{
+    {
+        std::unique_lock lock(_impl->mutex);
+        const auto found = _impl->counters.find(key);
+        if (found == _impl->counters.end()) return;
+        _impl->counters.erase(found);
+    }
+    _impl->changed();
+}
+
+std::int64_t CounterStore::value(std::string_view key) const
+{
+    std::shared_lock lock(_impl->mutex);
+    const auto found = _impl->counters.find(key);
+    return found == _impl->counters.end() ? 0 : found->second.load();
+}
+
+std::map<std::string, std::int64_t> CounterStore::snapshot() const
+{
+    return _impl->snapshot();
+}
+
+std::string CounterStore::openMetrics(std::string_view family) const
+{
+    std::string text = fmt::format("# TYPE {} unknown\n", family);
+    for (const auto& [key, count] : snapshot()) {
+        std::string label;
+        for (const char c : key) {
+            if (c == '\n')
+                label += "\\n";
+            else if (c == '"' || c == '\\')
+                label += {'\\', c};
+            else
+                label += c;
+        }
+        text += fmt::format("{}{{key=\"{}\"}} {}\n", family, label, count);
+    }
+    return text + "# EOF\n";
+}
+
+} // namespace platform

@@ -1,0 +1,106 @@
+#pragma once
+
+#include <cstdint>
+#include <filesystem>
+#include <initializer_list>
+#include <memory>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/base/Bytes.h"
+#include "platform/base/Date.h"
+#include "platform/base/FileHandle.h"
+#include "platform/values/Error.h"
+
+namespace platform {
+
+struct FileInfo {
+    enum class Kind { File, Directory, Other };
+    Kind kind = Kind::File;
+    std::uint64_t size = 0;
+    Date modified;
+    Date created; ///< birth time where the file system has one, else `modified`
+};
+
+/// A file that grows: whole records are added at its end. One thread at a time.
+class AppendFile {
+public:
+    virtual ~AppendFile() = default;
+    /// Bytes in the file.
+    [[nodiscard]] virtual std::uint64_t size() const = 0;
+    /// Adds the bytes of `parts` (four at most), one behind the other, in one go. After a failure the file is as long
+    /// as it was before: what was written of a record is cut off again, and if that fails too nothing more is added.
+    /// Not synced.
+    [[nodiscard]] virtual Result<void> append(std::initializer_list<std::string_view> parts) = 0;
+};
+
+/// The file system, as far as the device's services need it. Paths are absolute. The last component of a path is
+/// never followed when it is a link. Any thread.
+///
+/// A twin in tests/support keeps files in memory and fails on demand.
+class FileSystem {
+public:
+    virtual ~FileSystem() = default;
+
+    /// The whole file, at most `maximumSize` bytes (a larger one is an error, EFBIG).
+    [[nodiscard]] virtual Result<Bytes> read(const std::filesystem::path& path, std::size_t maximumSize) = 0;
+    /// Publishes a file whole: writes a temporary beside it, syncs, renames it over `path`, syncs the directory.
+    /// A failure leaves the old file as it was, or, where only the directory couldn't be synced, the new one that may
+    /// be gone after a power cut. Mode 0600.
+    [[nodiscard]] virtual Result<void> writeAtomically(const std::filesystem::path& path,
+                                                       std::string_view contents) = 0;
+    /// Publishes the file `source` as `path`, in one step: it is synced and renamed, or, on another file system, copied
+    /// beside `path` first. Who has the old file open keeps reading that. A failure leaves the old file as it was;
+    /// `source` is gone only after a success. Mode 0600.
+    [[nodiscard]] virtual Result<void> replace(const std::filesystem::path& path,
+                                               const std::filesystem::path& source) = 0;
+    /// Publishes a copy of what `source` holds as `path`, whole, like `writeAtomically`.
+    [[nodiscard]] virtual Result<void> copy(const std::filesystem::path& path, const FileHandle& source) = 0;
+    /// Makes the directory and its parents, those made with mode 0700. One that is there already is fine.
+    [[nodiscard]] virtual Result<void> createDirectories(const std::filesystem::path& path) = 0;
+    [[nodiscard]] virtual Result<FileInfo> info(const std::filesystem::path& path) = 0;
+    /// Removes a file; one that isn't there is an error (ENOENT).
+    [[nodiscard]] virtual Result<void> remove(const std::filesystem::path& path) = 0;
+    /// The names in a directory, in no order, without "." and "..".
+    [[nodiscard]] virtual Result<std::vector<std::string>> list(const std::filesystem::path& path) = 0;
+    [[nodiscard]] virtual Result<FileHandle> openForReading(const std::filesystem::path& path) = 0;
+    /// Makes a new, empty file, mode 0600, and opens it; one that is there already is an error (EEXIST).
+    [[nodiscard]] virtual Result<std::unique_ptr<AppendFile>> createForAppending(const std::filesystem::path& path) = 0;
+    /// Locks a file, made where it is missing, against other processes, for as long as the handle lives. An error where
+    /// another has it (EWOULDBLOCK).
+    [[nodiscard]] virtual Result<FileHandle> lock(const std::filesystem::path& path) = 0;
+    /// A new, empty file in memory, for reading and writing: it goes with its last user. Without a name, for making one
+    /// in a directory and removing it may take a file system's journal a quarter of a millisecond.
+    [[nodiscard]] virtual Result<FileHandle> createTemporary() = 0;
+};
+
+[[nodiscard]] std::unique_ptr<FileSystem> makeSystemFiles();
+
+/// About an open file. Any thread.
+[[nodiscard]] Result<FileInfo> fileInfo(const FileHandle& file);
+
+/// A directory of one process's own: mode 0700, with a file "lock" that is locked as long as this lives. It and the
+/// lock must not be links.
+struct LockedDirectory {
+    FileHandle directory;
+    FileHandle lock;
+
+    /// An error where it isn't there, isn't ours, or another process has it (EWOULDBLOCK).
+    [[nodiscard]] static Result<LockedDirectory> open(const std::filesystem::path& path);
+};
+
+/// The user's directories. Made on first use by whoever writes there, never at start-up.
+struct Directories {
+    std::filesystem::path caches;                  ///< $XDG_CACHE_HOME, else ~/.cache
+    std::filesystem::path config;                  ///< $XDG_CONFIG_HOME, else ~/.config
+    std::filesystem::path state;                   ///< $XDG_STATE_HOME, else ~/.local/state
+    std::filesystem::path data;                    ///< $XDG_DATA_HOME, else ~/.local/share
+    std::filesystem::path runtime;                 ///< $XDG_RUNTIME_DIR, else $TMPDIR/runtime-UID
+    std::filesystem::path temporary;               ///< $TMPDIR, else /tmp
+    std::vector<std::filesystem::path> systemData; ///< $XDG_DATA_DIRS, else /usr/local/share and /usr/share
+
+    [[nodiscard]] static Directories fromEnvironment();
+};
+
+} // namespace platform

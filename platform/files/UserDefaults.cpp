@@ -1,0 +1,235 @@
+#include "platform/files/UserDefaults.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <charconv>
+#include <fcntl.h>
+#include <mutex>
+#include <set>
+#include <sys/file.h>
+
+#include "platform/base/Log.h"
+#include "platform/files/Files.h"
+#include "platform/files/FileWatch.h"
+#include "platform/run/Queue.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
+
+namespace platform {
+
+namespace fs = std::filesystem;
+
+namespace {
+constexpr std::size_t kMaximumSize = 4u << 20;
+}
+
+struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
+    FileSystem* files = nullptr; // null: in memory only
+    fs::path path;
+    std::shared_ptr<Queue> writeQueue;
+
+    mutable std::mutex mutex; // guards all below
+    Dictionary values;
+    Dictionary registered;
+    std::set<std::string, std::less<>> dirty; // set here, not yet in the file
+    bool writeQueued = false;
+    bool fileIsBroken = false;
+    std::mutex writing; // one reader or writer of the file at a time; taken before `mutex`
+    std::unique_ptr<FileWatch> watch;
+
+    /// What the file has; nothing where it is missing, an error where it can't be read or is no JSON object.
+    Result<Dictionary> readFile() const
+    {
+        auto bytes = files->read(path, kMaximumSize);
+        if (!bytes && bytes.error().domain == kPosixErrorDomain && bytes.error().code == ENOENT) return Dictionary();
+        if (!bytes) return std::unexpected(std::move(bytes.error()));
+        auto value = parseJson(bytes->view(), kMaximumSize);
+        if (!value) return std::unexpected(std::move(value.error()));
+        if (!value->asDictionary())
+            return std::unexpected(Error::withReason(std::string(kFormatErrorDomain), 1, "not a JSON object"));
+        return *value->asDictionary();
+    }
+
+    void load()
+    {
+        std::lock_guard reader(writing); // what is read here must not be older than what a writer leaves
+        auto contents = readFile();
+        std::lock_guard lock(mutex);
+        fileIsBroken = !contents;
+        if (!contents) {
+            defaultLog().error("user defaults {} can't be read, defaults apply: {}", path.string(),
+                               contents.error().description());
+            contents = Dictionary();
+        }
+        for (const std::string& key : dirty) {
+            if (const Value* mine = values.find(key))
+                contents->set(key, *mine);
+            else
+                contents->remove(key);
+        }
+        values = std::move(*contents);
+    }
+
+    /// Writes what was set over what the file has by now.
+    Result<void> write()
+    {
+        std::lock_guard writer(writing);
+        {
+            std::lock_guard lock(mutex);
+            writeQueued = false;
+            if (dirty.empty()) return {};
+        }
+        if (auto made = files->createDirectories(path.parent_path()); !made) return writeFailed(made.error());
+        // Against others who edit the file in the same way; where there can be no lock, we go on without.
+        const FileHandle lockFile(
+            open((path.string() + ".lock").c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600));
+        if (lockFile) flock(lockFile.fd(), LOCK_EX);
+
+        auto contents = readFile();
+        if (!contents) keepAside();
+        Dictionary merged = contents ? std::move(*contents) : Dictionary();
+        std::set<std::string, std::less<>> written;
+        {
+            std::lock_guard lock(mutex);
+            written.swap(dirty);
+            for (const std::string& key : written) {
+                if (const Value* mine = values.find(key))
+                    merged.set(key, *mine);
+                else
+                    merged.remove(key);
+            }
+            values = merged;
+            fileIsBroken = false;
+        }
+        const std::string text = toJson(merged, JsonStyle::Pretty) + "\n";
+        const auto done = text.size() <= kMaximumSize ? files->writeAtomically(path, text)
+                                                      : Result<void>(std::unexpected(Error::posix(EFBIG)));
+        if (done) return {};
+        std::lock_guard lock(mutex);
+        dirty.merge(written);
+        return writeFailed(done.error());
+    }
+
+    /// A broken file is somebody's work too: it isn't written over, but kept beside.
+    void keepAside()
+    {
+        std::error_code failed;
+        fs::rename(path, path.string() + ".corrupt", failed);
+        if (!failed)
+            defaultLog().error("user defaults {} are broken, kept as {}.corrupt", path.string(), path.string());
+    }
+
+    Result<void> writeFailed(const Error& error) const
+    {
+        defaultLog().error("user defaults {} can't be written: {}", path.string(), error.description());
+        return std::unexpected(error);
+    }
+};
+
+UserDefaults::UserDefaults() : _impl(std::make_shared<Impl>()) {}
+
+UserDefaults::UserDefaults(FileSystem& files, fs::path path, std::shared_ptr<Queue> writeQueue) : UserDefaults()
+{
+    _impl->files = &files;
+    _impl->path = std::move(path);
+    _impl->writeQueue = std::move(writeQueue);
+    _impl->load();
+}
+
+UserDefaults::~UserDefaults()
+{
+    _impl->watch.reset(); // here, on the loop's thread: a write that waits may keep the rest
+}
+
+void UserDefaults::registerDefaults(const Dictionary& defaults)
+{
+    std::lock_guard lock(_impl->mutex);
+    for (const auto& [key, value] : defaults) _impl->registered.set(key, value);
+}
+
+Value UserDefaults::value(std::string_view key) const
+{
+    std::lock_guard lock(_impl->mutex);
+    if (const Value* found = _impl->values.find(key)) return *found;
+    const Value* found = _impl->registered.find(key);
+    return found ? *found : Value();
+}
+
+bool UserDefaults::boolean(std::string_view key) const
+{
+    const Value found = value(key);
+    if (const auto flag = found.asBool()) return *flag;
+    if (const auto number = found.asDouble()) return *number != 0;
+    const std::string* text = found.asString();
+    if (!text) return false;
+    std::string lowered = *text;
+    std::ranges::transform(lowered, lowered.begin(),
+                           [](unsigned char c) { return static_cast<char>(std::tolower(c)); });
+    return lowered == "true" || lowered == "yes" || lowered == "1";
+}
+
+std::optional<std::string> UserDefaults::string(std::string_view key) const
+{
+    const Value found = value(key);
+    const std::string* text = found.asString();
+    return text && !text->empty() ? std::optional(*text) : std::nullopt;
+}
+
+std::optional<std::int64_t> UserDefaults::integer(std::string_view key) const
+{
+    const Value found = value(key);
+    if (const auto number = found.asInt()) return number;
+    const std::string* text = found.asString();
+    std::int64_t number = 0;
+    if (!text) return std::nullopt;
+    const auto [end, error] = std::from_chars(text->data(), text->data() + text->size(), number);
+    return error == std::errc() && end == text->data() + text->size() ? std::optional(number) : std::nullopt;
+}
+
+std::optional<Date> UserDefaults::date(std::string_view key) const
+{
+    const auto seconds = value(key).asDouble();
+    return seconds ? std::optional(dateFromSecondsSince1970(*seconds)) : std::nullopt;
+}
+
+void UserDefaults::set(std::string_view key, Value value)
+{
+    std::lock_guard lock(_impl->mutex);
+    if (const auto date = value.asDate()) value = secondsSince1970(*date);
+    if (value.isNull())
+        _impl->values.remove(key);
+    else
+        _impl->values.set(std::string(key), std::move(value));
+    if (!_impl->files) return;
+    _impl->dirty.emplace(key);
+    if (!_impl->writeQueue || std::exchange(_impl->writeQueued, true)) return;
+    _impl->writeQueue->async([impl = _impl] { (void)impl->write(); });
+}
+
+Result<void> UserDefaults::synchronize()
+{
+    return _impl->files ? _impl->write() : Result<void>();
+}
+
+void UserDefaults::reload()
+{
+    if (_impl->files) _impl->load();
+}
+
+Dictionary UserDefaults::contents() const
+{
+    std::lock_guard lock(_impl->mutex);
+    return _impl->values;
+}
+
+void UserDefaults::watch(RunLoop& runLoop)
+{
+    if (!_impl->files) return;
+    // Reading is handed to the write queue: the run loop's thread does no file work.
+    _impl->watch = std::make_unique<FileWatch>(runLoop, _impl->path, [weak = std::weak_ptr(_impl)] {
+        const auto impl = weak.lock();
+        if (impl && impl->writeQueue) impl->writeQueue->async([impl] { impl->load(); });
+    });
+}
+
+} // namespace platform

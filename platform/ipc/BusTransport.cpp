@@ -1,0 +1,216 @@
+#include "platform/ipc/BusTransport.h"
+
+#include <atomic>
+#include <cerrno>
+#include <cstring>
+#include <sys/epoll.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include "platform/base/Log.h"
+#include "platform/ipc/BusConnection.h"
+#include "platform/ipc/ListenSocket.h"
+
+namespace platform::ipc {
+
+namespace {
+
+const Log kLog("platform", "ipc");
+
+constexpr std::string_view kEndpointPrefix = "endpoint-";
+
+/// Connections accepted before the loop's other work has its turn.
+constexpr int kAcceptsPerTurn = 16;
+
+/// How soon to try again where the process or the system has no descriptor left.
+constexpr Duration kAcceptRetry = std::chrono::seconds(1);
+
+/// The loop's side of a listener: accepts until its listener is gone. Loop's thread but for what is before `start`, and
+/// `retire`.
+class Acceptance : public std::enable_shared_from_this<Acceptance> {
+public:
+    Acceptance(std::shared_ptr<BusContext> context, const Interface& interface, std::string label, ListenSocket socket)
+        : _context(std::move(context)), _interface(std::make_shared<const Interface>(interface)),
+          _label(std::move(label)), _socket(std::move(socket))
+    {}
+
+    [[nodiscard]] BusContext& context() const { return *_context; }
+    [[nodiscard]] std::string endpoint() const { return busAddress(_socket.path()); }
+
+    /// Before `start`.
+    void setAcceptor(Listener::Acceptor acceptor) { _acceptor = std::move(acceptor); }
+
+    void start()
+    {
+        if (_watch || _retired || !_acceptor) return;
+        _watch = _context->loop.watch(_socket.fd(), EPOLLIN, [weak = weak_from_this()](std::uint32_t) {
+            if (auto self = weak.lock()) self->accept();
+        });
+    }
+
+    /// Any thread: removes the path and accepts nobody any more. `stop` is to follow.
+    void retire()
+    {
+        _retired = true;
+        _socket.unlinkPath();
+    }
+
+    void stop()
+    {
+        _watch.reset();
+        _acceptor = {};
+    }
+
+private:
+    void accept()
+    {
+        for (int turn = 0; turn < kAcceptsPerTurn && !_retired; ++turn) {
+            if (_open >= _context->limits.connections) {
+                kLog.info("{}: {} connections are open, others wait", _label, _open);
+                return pause(true);
+            }
+            FileHandle socket(accept4(_socket.fd(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
+            if (socket) {
+                greet(std::move(socket));
+            } else if (errno == EMFILE || errno == ENFILE || errno == ENOBUFS || errno == ENOMEM) {
+                kLog.error("{}: can't accept: {}", _label, std::strerror(errno));
+                pause(true);
+                return retryLater();
+            } else if (errno != EINTR && errno != ECONNABORTED) {
+                if (errno != EAGAIN) kLog.error("{}: can't accept: {}", _label, std::strerror(errno));
+                return;
+            }
+        }
+    }
+
+    void greet(FileHandle socket)
+    {
+        const auto credentials = peerCredentials(socket.fd());
+        if (!credentials || !mayConnect(credentials->uid, geteuid())) {
+            kLog.error("{}: refused process {} of user {}", _label, credentials ? credentials->pid : 0,
+                       credentials ? credentials->uid : 0);
+            return;
+        }
+        ++_open;
+        auto queue = Queue::make(_label, Queue::Kind::Serial, _context->executor, _context->clock);
+        auto connection =
+            BusConnection::make(_context, _interface, std::move(socket), Peer{credentials->pid, credentials->uid},
+                                std::move(queue), [weak = weak_from_this()] {
+                                    auto self = weak.lock();
+                                    if (!self) return;
+                                    --self->_open;
+                                    self->pause(false);
+                                });
+        _acceptor(connection->handle());
+    }
+
+    void pause(bool paused)
+    {
+        if (!_watch || std::exchange(_paused, paused) == paused) return;
+        _watch->setEvents(paused ? 0u : EPOLLIN);
+    }
+
+    void retryLater()
+    {
+        _context->clock.after(kAcceptRetry, [weak = weak_from_this(), &loop = _context->loop] {
+            loop.execute(Priority::Default, [weak] {
+                if (auto self = weak.lock()) self->pause(false);
+            });
+        });
+    }
+
+    const std::shared_ptr<BusContext> _context;
+    const std::shared_ptr<const Interface> _interface;
+    const std::string _label;
+    ListenSocket _socket;
+    Listener::Acceptor _acceptor;
+    std::unique_ptr<RunLoop::Watch> _watch;
+    unsigned _open = 0;
+    bool _paused = false;
+    std::atomic<bool> _retired = false;
+};
+
+class BusListener final : public Listener {
+public:
+    explicit BusListener(std::shared_ptr<Acceptance> acceptance)
+        : _acceptance(std::move(acceptance)), _endpoint(_acceptance->endpoint())
+    {}
+    ~BusListener() override
+    {
+        _acceptance->retire();
+        onLoop([acceptance = _acceptance] { acceptance->stop(); });
+    }
+    void setAcceptor(Acceptor acceptor) override { _acceptance->setAcceptor(std::move(acceptor)); }
+    void resume() override
+    {
+        onLoop([acceptance = _acceptance] { acceptance->start(); });
+    }
+    [[nodiscard]] std::string endpoint() const override { return _endpoint; }
+
+private:
+    void onLoop(Executor::Job job) { _acceptance->context().loop.execute(Priority::Default, std::move(job)); }
+
+    const std::shared_ptr<Acceptance> _acceptance;
+    const std::string _endpoint;
+};
+
+/// Stands in for an endpoint that couldn't be made.
+class DeafListener final : public Listener {
+public:
+    void setAcceptor(Acceptor) override {}
+    void resume() override {}
+    [[nodiscard]] std::string endpoint() const override { return {}; }
+};
+
+class BusTransport final : public Transport {
+public:
+    BusTransport(RunLoop& loop, Executor& executor, Clock& clock, std::filesystem::path directory, Limits limits)
+        : _context(std::make_shared<BusContext>(loop, executor, clock, limits)), _directory(std::move(directory))
+    {
+        sweepDeadSockets(_directory, kEndpointPrefix);
+    }
+
+    ~BusTransport() override
+    {
+        const auto connections = _context->connections;
+        for (const auto& connection : connections) connection->abandon();
+    }
+
+    Result<std::unique_ptr<Listener>> listen(const Interface& interface, const std::string& label) override
+    {
+        if (!_askedServiceManager.exchange(true))
+            if (auto socket = ListenSocket::fromServiceManager()) return make(interface, label, std::move(*socket));
+        auto socket = ListenSocket::bindExclusive(_directory / "socket");
+        if (!socket) return std::unexpected(std::move(socket.error()));
+        return make(interface, label, std::move(*socket));
+    }
+
+    std::unique_ptr<Listener> anonymous(const Interface& interface, const std::string& label) override
+    {
+        auto socket = ListenSocket::bindUnguessable(_directory, kEndpointPrefix);
+        if (socket) return make(interface, label, std::move(*socket));
+        kLog.error("{}: no endpoint: {}", label, socket.error().description());
+        return std::make_unique<DeafListener>();
+    }
+
+private:
+    std::unique_ptr<Listener> make(const Interface& interface, const std::string& label, ListenSocket socket)
+    {
+        return std::make_unique<BusListener>(
+            std::make_shared<Acceptance>(_context, interface, label, std::move(socket)));
+    }
+
+    const std::shared_ptr<BusContext> _context;
+    const std::filesystem::path _directory;
+    std::atomic<bool> _askedServiceManager = false;
+};
+
+} // namespace
+
+std::unique_ptr<Transport> makeBusTransport(RunLoop& runLoop, Executor& executor, Clock& clock,
+                                            std::filesystem::path directory, Limits limits)
+{
+    return std::make_unique<BusTransport>(runLoop, executor, clock, std::move(directory), limits);
+}
+
+} // namespace platform::ipc

@@ -1,0 +1,54 @@
+#include "platform/net/BackgroundPolicy.h"
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <charconv>
+#include <string>
+
+#include <curl/curl.h>
+
+#include "platform/net/UrlSession.h"
+
+namespace platform {
+
+using namespace std::chrono_literals;
+
+Duration retryDelay(unsigned failures, double jitter)
+{
+    constexpr Duration kFirst = 30s;
+    constexpr Duration kLongest = 1h;
+    const unsigned doublings = std::min(std::max(failures, 1u) - 1, 16u);
+    const double longest = std::min(toSeconds(kFirst) * (1u << doublings), toSeconds(kLongest));
+    return durationFromSeconds(longest * (0.5 + std::clamp(jitter, 0.0, 1.0) / 2));
+}
+
+bool mayGetBetter(const Error& error)
+{
+    if (error.domain == kPosixErrorDomain) return error.code == ENOSPC || error.code == EDQUOT;
+    if (error.domain != kUrlErrorDomain) return false;
+    constexpr std::array<std::int64_t, 6> kFinal{kUrlCancelled,        kUrlBadUrl,   kUrlUnsupported,
+                                                 kUrlTooManyRedirects, kUrlTooLarge, kUrlForbiddenRedirect};
+    return std::ranges::find(kFinal, error.code) == kFinal.end();
+}
+
+std::optional<Duration> retryAfter(std::string_view field, Date now)
+{
+    constexpr Duration kLongest = 24h;
+    const bool isNumber = !field.empty() && std::ranges::all_of(field, [](char c) { return c >= '0' && c <= '9'; });
+    if (isNumber) {
+        std::uint64_t seconds = 0;
+        const auto read = std::from_chars(field.data(), field.data() + field.size(), seconds);
+        if (read.ec != std::errc() || seconds >= 24 * 60 * 60) return kLongest;
+        return std::chrono::seconds(seconds);
+    }
+    constexpr std::size_t kLongestDate = 64;
+    if (field.size() > kLongestDate) return std::nullopt;
+    const time_t date = curl_getdate(std::string(field).c_str(), nullptr);
+    if (date < 0) return std::nullopt;
+    // As seconds: a date far off doesn't fit nanoseconds.
+    const double wait = static_cast<double>(date) - secondsSince1970(now);
+    return std::clamp<Duration>(durationFromSeconds(wait), 0s, kLongest);
+}
+
+} // namespace platform

@@ -1,0 +1,666 @@
+#include "platform/net/BackgroundSession.h"
+
+#include <algorithm>
+#include <atomic>
+#include <map>
+#include <mutex>
+#include <random>
+#include <set>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <fmt/format.h>
+
+#include "platform/base/Log.h"
+#include "platform/net/BackgroundPolicy.h"
+#include "platform/net/BackgroundStore.h"
+#include "platform/net/NetworkStatus.h"
+#include "platform/run/Clock.h"
+#include "platform/run/LivedTime.h"
+#include "platform/run/Queue.h"
+#include "platform/values/Json.h"
+
+namespace platform {
+
+namespace fs = std::filesystem;
+
+namespace {
+
+constexpr std::size_t kMaximumNote = 128u << 10; // any URL
+/// Bytes of a request's URL, header fields and own body.
+constexpr std::size_t kMaximumRequest = 256u << 10;
+constexpr Duration kLongestHold = std::chrono::hours(24);
+constexpr Duration kLongestResourceTimeout = std::chrono::hours(24 * 366);
+
+Error refusal(std::int64_t code, std::string reason)
+{
+    return Error::withReason(std::string(kUrlErrorDomain), code, std::move(reason));
+}
+
+std::size_t sizeOf(const UrlRequest& request)
+{
+    std::size_t size = request.url.string().size() + request.method.size() + request.body.size();
+    for (const auto& [name, value] : request.headers) size += name.size() + value.size();
+    return size;
+}
+
+/// The folder of a session: its identifier, made a file name.
+std::string folderName(const std::string& identifier)
+{
+    std::string name = percentEncodePathSegment(identifier);
+    if (name.starts_with('.')) name.replace(0, 1, "%2E");
+    return name.empty() ? "%" : name;
+}
+
+class Session;
+
+/// A task, as its owner sees it; the session keeps the rest.
+class Task final : public BackgroundTask, public std::enable_shared_from_this<Task> {
+public:
+    Task(std::weak_ptr<Session> session, const StoredTask& stored)
+        : _session(std::move(session)), _identifier(stored.identifier), _isUpload(stored.isUpload),
+          _request(stored.request), _note(stored.note)
+    {}
+    ~Task() override;
+
+    void resume() override;
+    void cancel() override;
+    void setNote(Value note) override;
+    [[nodiscard]] std::uint64_t identifier() const override { return _identifier; }
+    [[nodiscard]] const UrlRequest& originalRequest() const override { return *_request; }
+    [[nodiscard]] bool isUpload() const override { return _isUpload; }
+    [[nodiscard]] Value note() const override
+    {
+        std::lock_guard lock(_mutex);
+        return _note;
+    }
+    [[nodiscard]] Value timingData() const override
+    {
+        std::lock_guard lock(_mutex);
+        return _timing;
+    }
+    void setTiming(Value timing)
+    {
+        std::lock_guard lock(_mutex);
+        _timing = std::move(timing);
+    }
+
+private:
+    const std::weak_ptr<Session> _session;
+    const std::uint64_t _identifier;
+    const bool _isUpload;
+    const std::shared_ptr<const UrlRequest> _request;
+    mutable std::mutex _mutex;
+    Value _note;   // under the mutex
+    Value _timing; // under the mutex
+};
+
+/// Tells the delegate of an upload's progress: of the latest, where they come faster than it listens.
+class Progress : public std::enable_shared_from_this<Progress> {
+public:
+    Progress(std::weak_ptr<BackgroundSessionDelegate> delegate, std::shared_ptr<Queue> queue,
+             std::shared_ptr<Task> task)
+        : _delegate(std::move(delegate)), _queue(std::move(queue)), _task(std::move(task))
+    {}
+    void report(std::uint64_t sent, std::uint64_t expected)
+    {
+        _sent = sent;
+        if (_queued.exchange(true)) return;
+        _queue->async([self = shared_from_this(), expected] {
+            self->_queued = false;
+            if (auto delegate = self->_delegate.lock())
+                delegate->taskDidSendBodyData(self->_task, self->_sent, expected);
+        });
+    }
+
+private:
+    const std::weak_ptr<BackgroundSessionDelegate> _delegate;
+    const std::shared_ptr<Queue> _queue;
+    const std::shared_ptr<Task> _task;
+    std::atomic<std::uint64_t> _sent = 0;
+    std::atomic<bool> _queued = false;
+};
+
+/// All of it belongs to `_queue` but what is const.
+class Session final : public BackgroundSession, public std::enable_shared_from_this<Session> {
+public:
+    Session(const BackgroundEnvironment& environment, BackgroundSessionConfiguration configuration,
+            std::weak_ptr<BackgroundSessionDelegate> delegate, std::shared_ptr<Queue> delegateQueue)
+        : _environment(environment), _configuration(std::move(configuration)), _delegate(std::move(delegate)),
+          _delegateQueue(std::move(delegateQueue)),
+          _queue(Queue::make(_configuration.identifier + ".transfers", Queue::Kind::Serial, environment.executor,
+                             environment.clock)),
+          _answers(Queue::make(_configuration.identifier + ".tasks", Queue::Kind::Concurrent, environment.executor,
+                               environment.clock)),
+          _loads(environment.loader.makeSession({.requestTimeout = _configuration.requestTimeout,
+                                                 .maximumResponseSize = _configuration.maximumResponseSize,
+                                                 .caFile = _configuration.caFile},
+                                                _queue)),
+          _time(environment.clock)
+    {}
+    ~Session() override
+    {
+        _environment.clock.cancel(_timer);
+        for (const auto& [identifier, entry] : _entries)
+            if (entry.attempt) entry.attempt->cancel();
+    }
+
+    void start()
+    {
+        onQueue([](Session& self) { self._openStore(false); });
+    }
+    Result<std::shared_ptr<BackgroundTask>> uploadTask(UrlRequest request, const fs::path& body) override
+    {
+        const auto file = makeSystemFiles()->openForReading(body);
+        if (!file) return std::unexpected(file.error());
+        return _queue->sync([&] { return _add(std::move(request), &*file); });
+    }
+    Result<std::shared_ptr<BackgroundTask>> downloadTask(UrlRequest request) override
+    {
+        return _queue->sync([&] { return _add(std::move(request), nullptr); });
+    }
+    void getTasks(std::move_only_function<void(std::vector<std::shared_ptr<BackgroundTask>>)> callback) override
+    {
+        _queue->async([self = shared_from_this(), callback = std::move(callback)]() mutable {
+            std::vector<std::shared_ptr<BackgroundTask>> tasks;
+            for (const auto& [identifier, entry] : self->_entries)
+                if (auto task = entry.handle.lock(); task && !entry.stored.outcome) tasks.push_back(std::move(task));
+            self->_answers->async(
+                [callback = std::move(callback), tasks = std::move(tasks)]() mutable { callback(std::move(tasks)); });
+        });
+    }
+
+    // Of a task.
+    void resume(const std::shared_ptr<Task>& task)
+    {
+        _queue->sync([&] { _resume(task); });
+    }
+    void cancel(const std::shared_ptr<Task>& task)
+    {
+        _queue->sync([&] { _cancel(task); });
+    }
+    void setNote(std::uint64_t identifier, const Value& note)
+    {
+        _queue->sync([&] {
+            Entry* entry = _find(identifier);
+            if (!entry) return;
+            entry->stored.note = note;
+            _save(*entry);
+        });
+    }
+    /// Its owner has let go of it.
+    void released(std::uint64_t identifier)
+    {
+        onQueue([identifier](Session& self) {
+            if (Entry* entry = self._find(identifier); entry && entry->handle.expired()) self._drop(identifier);
+        });
+    }
+
+private:
+    struct Entry {
+        StoredTask stored;
+        std::weak_ptr<Task> handle;
+        std::shared_ptr<Task> kept; ///< from resume on
+        std::shared_ptr<UrlTask> attempt;
+        std::uint64_t attemptNumber = 0;
+        Duration due{}; ///< its place in the agenda
+    };
+
+    /// Runs `work` on the queue, if the session is still there then.
+    template <class Work> void onQueue(Work work)
+    {
+        _queue->async([weak = weak_from_this(), work = std::move(work)]() mutable {
+            if (auto self = weak.lock()) work(*self);
+        });
+    }
+    /// Runs `call` with the delegate on its queue.
+    template <class Call> void _tell(Call call)
+    {
+        _delegateQueue->async([delegate = _delegate, call = std::move(call)]() mutable {
+            if (auto told = delegate.lock()) call(*told);
+        });
+    }
+    Entry* _find(std::uint64_t identifier)
+    {
+        const auto found = _entries.find(identifier);
+        return found == _entries.end() ? nullptr : &found->second;
+    }
+
+    void _openStore(bool make);
+    void _takeUp(BackgroundStore::Contents contents);
+    Result<std::shared_ptr<BackgroundTask>> _add(UrlRequest request, const FileHandle* body);
+    void _save(const Entry& entry);
+    void _resume(const std::shared_ptr<Task>& task);
+    void _cancel(const std::shared_ptr<Task>& task);
+    void _drop(std::uint64_t identifier);
+
+    void _followNetwork();
+    void _networkChanged();
+    [[nodiscard]] bool _mayTransfer() const
+    {
+        return _network && _network->online && (!_network->metered || _configuration.allowsMetered);
+    }
+    [[nodiscard]] Duration _holdOf(const UrlRequest& request, Duration now);
+    void _hold(const UrlRequest& request, const UrlResponse& response);
+
+    void _unschedule(Entry& entry);
+    void _schedule(Entry& entry);
+    void _pump();
+    void _setTimer(Duration now);
+    void _begin(Entry& entry);
+    void _ended(std::uint64_t identifier, std::uint64_t attempt, std::optional<UrlResponse> response,
+                std::optional<Error> error);
+    void _retry(Entry& entry, const Error& error);
+    void _stopAttempt(Entry& entry);
+    void _finish(Entry& entry, std::optional<UrlResponse> response, std::optional<Error> error);
+    void _report(const Entry& entry);
+    void _reported(std::uint64_t identifier);
+
+    const BackgroundEnvironment _environment;
+    const BackgroundSessionConfiguration _configuration;
+    const std::weak_ptr<BackgroundSessionDelegate> _delegate;
+    const std::shared_ptr<Queue> _delegateQueue;
+    const std::shared_ptr<Queue> _queue;
+    const std::shared_ptr<Queue> _answers;
+    const std::shared_ptr<UrlSession> _loads;
+
+    std::unique_ptr<BackgroundStore> _store;
+    std::optional<Error> _storeError; // where there can't be one
+    LivedTime _time;
+    std::map<std::uint64_t, Entry> _entries;
+    std::vector<std::uint64_t> _leftOver; ///< are over, and could not be removed from the store yet
+    std::uint64_t _bodyBytes = 0;
+    std::map<std::string, Duration> _holds;
+
+    // A resumed task is in the agenda, at the moment when something is to be done about it: its deadline, or the end of
+    // a wait. One that could begin now is startable beside that.
+    std::set<std::pair<Duration, std::uint64_t>> _agenda;
+    std::set<std::uint64_t> _startable;
+    unsigned _running = 0;
+    std::uint64_t _lastAttempt = 0;
+    Clock::TimerId _timer = 0;
+    std::optional<Duration> _timerDue;
+
+    NetworkStatus::Token _networkToken;
+    std::optional<NetworkState> _network;
+    std::minstd_rand _random{std::random_device()()};
+};
+
+Task::~Task()
+{
+    if (const auto session = _session.lock()) session->released(_identifier);
+}
+
+void Task::resume()
+{
+    if (const auto session = _session.lock()) session->resume(shared_from_this());
+}
+
+void Task::cancel()
+{
+    if (const auto session = _session.lock()) session->cancel(shared_from_this());
+}
+
+void Task::setNote(Value note)
+{
+    if (const std::size_t size = jsonSize(note); size > kMaximumNote)
+        return defaultLog().error("a note of {} bytes is left out of background task {}", size, _identifier);
+    {
+        std::lock_guard lock(_mutex);
+        _note = note;
+    }
+    if (const auto session = _session.lock()) session->setNote(_identifier, note);
+}
+
+// ---- the store ----
+
+void Session::_openStore(bool make)
+{
+    const fs::path directory = _environment.directory / folderName(_configuration.identifier);
+    if (_store || _storeError || (!make && !BackgroundStore::exists(directory))) return;
+    auto store = BackgroundStore::open(directory);
+    if (!store) {
+        const Error error = store.error();
+        defaultLog().error("background transfers can't be kept in {}: {}", directory.string(), error.description());
+        store = BackgroundStore::openTemporary(_environment.temporary);
+        if (!store) _storeError = store.error();
+        _tell([error](BackgroundSessionDelegate& delegate) { delegate.sessionDidBecomeInvalid(error); });
+    }
+    if (!store) return;
+    _store = std::move(*store);
+    _takeUp(_store->takeContents());
+}
+
+void Session::_takeUp(BackgroundStore::Contents contents)
+{
+    _time = LivedTime(_environment.clock, contents.time);
+    const Duration now = _time.now();
+    // A time beyond what can have been written would stick.
+    for (const auto& [host, until] : contents.holds)
+        if (until > now) _holds[host] = std::min(until, now + kLongestHold);
+    for (StoredTask& stored : contents.tasks) {
+        if (!stored.resumed && !stored.outcome) {
+            (void)_store->forget(stored.identifier);
+            continue;
+        }
+        stored.deadline = std::min(stored.deadline, now + kLongestResourceTimeout);
+        stored.notBefore = std::min(stored.notBefore, now + kLongestHold);
+        // Whoever was told of a download may have moved its file away and been killed then.
+        struct stat status{};
+        if (!stored.isUpload && stored.outcome && !stored.outcome->error &&
+            lstat(_store->downloadPath(stored.identifier).c_str(), &status) != 0)
+            stored.outcome.reset();
+
+        Entry& entry = _entries[stored.identifier];
+        entry.kept = std::make_shared<Task>(weak_from_this(), stored);
+        entry.handle = entry.kept;
+        entry.stored = std::move(stored);
+        _bodyBytes += entry.stored.bodySize;
+        if (entry.stored.outcome)
+            _report(entry);
+        else
+            _schedule(entry);
+    }
+    if (!_entries.empty()) _followNetwork();
+    _pump();
+}
+
+Result<std::shared_ptr<BackgroundTask>> Session::_add(UrlRequest request, const FileHandle* body)
+{
+    _openStore(true);
+    if (!_store) return std::unexpected(*_storeError);
+    if (request.url.empty()) return std::unexpected(refusal(kUrlBadUrl, "no URL"));
+    if (sizeOf(request) > kMaximumRequest)
+        return std::unexpected(refusal(kUrlTooLarge, fmt::format("a request of more than {} bytes", kMaximumRequest)));
+    if (_entries.size() >= _configuration.maximumTasks)
+        return std::unexpected(refusal(kUrlTooLarge, fmt::format("{} tasks are waiting", _entries.size())));
+    StoredTask stored{.isUpload = body != nullptr, .request = std::make_shared<const UrlRequest>(std::move(request))};
+    const std::uint64_t room = _configuration.maximumBodyBytes - std::min(_configuration.maximumBodyBytes, _bodyBytes);
+    if (auto added = _store->add(stored, body, room); !added) return std::unexpected(std::move(added.error()));
+
+    _bodyBytes += stored.bodySize;
+    auto task = std::make_shared<Task>(weak_from_this(), stored);
+    Entry& entry = _entries[stored.identifier];
+    entry.handle = task;
+    entry.stored = std::move(stored);
+    return task;
+}
+
+void Session::_save(const Entry& entry)
+{
+    if (auto saved = _store->save(entry.stored, _time.mark()); !saved)
+        defaultLog().error("background task {} can't be saved: {}", entry.stored.identifier,
+                           saved.error().description());
+}
+
+void Session::_resume(const std::shared_ptr<Task>& task)
+{
+    Entry* entry = _find(task->identifier());
+    if (!entry || entry->stored.resumed || entry->stored.outcome) return;
+    entry->kept = task;
+    entry->stored.resumed = true;
+    entry->stored.deadline = _time.now() + std::min<Duration>(_configuration.resourceTimeout, kLongestResourceTimeout);
+    _save(*entry);
+    _followNetwork();
+    _schedule(*entry);
+    _pump();
+}
+
+void Session::_cancel(const std::shared_ptr<Task>& task)
+{
+    Entry* entry = _find(task->identifier());
+    if (!entry || entry->stored.outcome) return;
+    entry->kept = task;
+    _finish(*entry, std::nullopt, refusal(kUrlCancelled, "cancelled"));
+    _pump();
+}
+
+void Session::_drop(std::uint64_t identifier)
+{
+    const auto found = _entries.find(identifier);
+    _bodyBytes -= found->second.stored.bodySize;
+    _entries.erase(found);
+    _leftOver.push_back(identifier);
+    std::erase_if(_leftOver, [this](std::uint64_t left) {
+        const auto forgotten = _store->forget(left);
+        if (!forgotten)
+            defaultLog().error("background task {} can't be removed: {}", left, forgotten.error().description());
+        return forgotten.has_value();
+    });
+}
+
+// ---- what tasks wait for ----
+
+void Session::_followNetwork()
+{
+    if (_networkToken) return;
+    _networkToken = _environment.network.observe([weak = weak_from_this(), queue = _queue](const NetworkState&) {
+        queue->async([weak] {
+            if (auto self = weak.lock()) self->_networkChanged();
+        });
+    });
+    _network = _environment.network.current();
+}
+
+void Session::_networkChanged()
+{
+    const bool wasOffline = _network && !_network->online;
+    _network = _environment.network.current();
+    for (auto& [identifier, entry] : _entries) {
+        if (entry.attempt && _network->online && !_mayTransfer()) {
+            _stopAttempt(entry);
+            _schedule(entry);
+        } else if (wasOffline && _network->online && !entry.attempt && entry.stored.notBefore > Duration::zero()) {
+            entry.stored.notBefore = Duration::zero(); // what failed, failed for the lack of a network
+            _schedule(entry);
+        }
+    }
+    _pump();
+}
+
+Duration Session::_holdOf(const UrlRequest& request, Duration now)
+{
+    if (_holds.empty()) return Duration::zero();
+    const auto found = _holds.find(request.url.host());
+    if (found == _holds.end()) return Duration::zero();
+    if (found->second > now) return found->second;
+    _holds.erase(found);
+    return Duration::zero();
+}
+
+void Session::_hold(const UrlRequest& request, const UrlResponse& response)
+{
+    const std::string* field = response.headers.find("Retry-After");
+    if (!field) return;
+    const auto wait = retryAfter(*field, _environment.clock.wallNow());
+    if (!wait || *wait <= Duration::zero()) return;
+    const Duration until = _time.now() + *wait;
+    // The service behind a redirect is asked through both.
+    for (const std::string& host : std::set<std::string>{request.url.host(), response.url.host()}) {
+        _holds[host] = until;
+        if (auto saved = _store->saveHold(host, until, _time.mark()); !saved)
+            defaultLog().error("the wait that {} asks for can't be saved: {}", host, saved.error().description());
+    }
+}
+
+// ---- transfers ----
+
+void Session::_unschedule(Entry& entry)
+{
+    _agenda.erase({entry.due, entry.stored.identifier});
+    _startable.erase(entry.stored.identifier);
+}
+
+void Session::_schedule(Entry& entry)
+{
+    _unschedule(entry);
+    if (!entry.stored.resumed || entry.stored.outcome) return;
+    const Duration now = _time.now();
+    const Duration mayBegin = std::max(entry.stored.notBefore, _holdOf(*entry.stored.request, now));
+    const bool waits = !entry.attempt && mayBegin > now;
+    entry.due = waits ? std::min(mayBegin, entry.stored.deadline) : entry.stored.deadline;
+    _agenda.emplace(entry.due, entry.stored.identifier);
+    if (!waits && !entry.attempt) _startable.insert(entry.stored.identifier);
+}
+
+void Session::_pump()
+{
+    const Duration now = _time.now();
+    while (!_agenda.empty() && _agenda.begin()->first <= now) {
+        Entry& entry = _entries.at(_agenda.begin()->second);
+        if (entry.stored.deadline <= now)
+            _finish(entry, std::nullopt, refusal(kUrlTimedOut, "not done within the time that it may take"));
+        else
+            _schedule(entry);
+    }
+    while (_mayTransfer() && _running < _configuration.parallelTransfers && !_startable.empty()) {
+        Entry& entry = _entries.at(*_startable.begin());
+        if (_holdOf(*entry.stored.request, now) > now)
+            _schedule(entry);
+        else
+            _begin(entry);
+    }
+    _setTimer(now);
+}
+
+void Session::_setTimer(Duration now)
+{
+    const auto due = _agenda.empty() ? std::nullopt : std::optional(_agenda.begin()->first);
+    if (due == _timerDue) return;
+    _environment.clock.cancel(std::exchange(_timer, 0));
+    _timerDue = due;
+    if (!due) return;
+    _timer = _environment.clock.after(*due - now, [weak = weak_from_this(), queue = _queue] {
+        queue->async([weak] {
+            const auto self = weak.lock();
+            if (!self) return;
+            self->_timerDue.reset();
+            self->_pump();
+        });
+    });
+}
+
+void Session::_begin(Entry& entry)
+{
+    const StoredTask& stored = entry.stored;
+    auto file = stored.isUpload ? _store->openBody(stored) : _store->createDownload(stored.identifier);
+    if (!file) {
+        if (mayGetBetter(file.error())) return _retry(entry, file.error());
+        return _finish(entry, std::nullopt, std::move(file.error()));
+    }
+    TransferFiles files;
+    if (stored.isUpload) {
+        files.upload = std::move(*file);
+        files.progress = [progress = std::make_shared<Progress>(_delegate, _delegateQueue, entry.kept)](
+                             std::uint64_t sent, std::uint64_t expected) { progress->report(sent, expected); };
+    } else {
+        files.download = std::move(*file);
+    }
+    entry.attemptNumber = ++_lastAttempt;
+    entry.attempt = _loads->transferTask(
+        *stored.request, std::move(files),
+        [weak = weak_from_this(), identifier = stored.identifier, attempt = _lastAttempt](
+            const std::optional<Bytes>&, std::optional<UrlResponse> response, std::optional<Error> error) {
+            if (auto self = weak.lock()) self->_ended(identifier, attempt, std::move(response), std::move(error));
+        });
+    ++_running;
+    _schedule(entry);
+    entry.attempt->resume();
+}
+
+void Session::_ended(std::uint64_t identifier, std::uint64_t attempt, std::optional<UrlResponse> response,
+                     std::optional<Error> error)
+{
+    Entry* entry = _find(identifier);
+    if (!entry || !entry->attempt || entry->attemptNumber != attempt) return; // stopped meanwhile
+    entry->kept->setTiming(entry->attempt->timingData());
+    entry->attempt.reset();
+    --_running;
+    if (!error && response) {
+        _hold(*entry->stored.request, *response);
+        if (!entry->stored.isUpload)
+            if (auto synced = _store->syncDownload(identifier); !synced) error = std::move(synced.error());
+    }
+    if (error && mayGetBetter(*error))
+        _retry(*entry, *error);
+    else
+        _finish(*entry, std::move(response), std::move(error));
+    _pump();
+}
+
+void Session::_retry(Entry& entry, const Error& error)
+{
+    ++entry.stored.failures;
+    const double jitter = std::uniform_real_distribution<double>()(_random);
+    const Duration delay = retryDelay(entry.stored.failures, jitter);
+    defaultLog().info("background task {} is tried again in {:.0f} s: {}", entry.stored.identifier, toSeconds(delay),
+                      error.description());
+    entry.stored.notBefore = _time.now() + delay;
+    _save(entry);
+    _schedule(entry);
+}
+
+void Session::_stopAttempt(Entry& entry)
+{
+    if (!entry.attempt) return;
+    std::exchange(entry.attempt, nullptr)->cancel();
+    --_running;
+}
+
+void Session::_finish(Entry& entry, std::optional<UrlResponse> response, std::optional<Error> error)
+{
+    _stopAttempt(entry);
+    _unschedule(entry);
+    entry.stored.outcome = {std::move(response), std::move(error)};
+    _save(entry);
+    _report(entry);
+}
+
+void Session::_report(const Entry& entry)
+{
+    const auto& [response, error] = *entry.stored.outcome;
+    const std::uint64_t identifier = entry.stored.identifier;
+    _tell([weak = weak_from_this(), task = entry.kept, response, error,
+           file = _store->downloadPath(identifier)](BackgroundSessionDelegate& delegate) {
+        if (!task->isUpload() && response && !error) {
+            delegate.taskDidFinishDownloading(task, file, *response);
+            unlink(file.c_str());
+        }
+        delegate.taskDidComplete(task, response, error);
+        if (auto self = weak.lock())
+            self->onQueue([identifier = task->identifier()](Session& session) { session._reported(identifier); });
+    });
+}
+
+void Session::_reported(std::uint64_t identifier)
+{
+    if (!_find(identifier)) return;
+    _drop(identifier);
+    if (_entries.empty()) _tell([](BackgroundSessionDelegate& delegate) { delegate.sessionDidFinishEvents(); });
+}
+
+class Sessions final : public BackgroundSessions {
+public:
+    explicit Sessions(BackgroundEnvironment environment) : _environment(std::move(environment)) {}
+    std::shared_ptr<BackgroundSession> make(BackgroundSessionConfiguration configuration,
+                                            std::weak_ptr<BackgroundSessionDelegate> delegate,
+                                            std::shared_ptr<Queue> delegateQueue) override
+    {
+        auto session = std::make_shared<Session>(_environment, std::move(configuration), std::move(delegate),
+                                                 std::move(delegateQueue));
+        session->start();
+        return session;
+    }
+
+private:
+    const BackgroundEnvironment _environment;
+};
+
+} // namespace
+
+std::unique_ptr<BackgroundSessions> makeBackgroundSessions(BackgroundEnvironment environment)
+{
+    return std::make_unique<Sessions>(std::move(environment));
+}
+
+} // namespace platform

@@ -1,0 +1,124 @@
+#pragma once
+
+#include <cstdint>
+#include <filesystem>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/net/UrlSession.h"
+
+namespace platform {
+
+class Clock;
+class Executor;
+class NetworkStatus;
+class Queue;
+
+/// A transfer that outlives the process; see `BackgroundSession`. Any thread but the run loop's: `resume`, `cancel` and
+/// `setNote` write to disk.
+class BackgroundTask : public UrlTask {
+public:
+    /// What the owner wants to remember of the task, kept with it: a small JSON value, 128 KiB of text at most (a
+    /// larger one is logged and left out).
+    virtual void setNote(Value note) = 0;
+    [[nodiscard]] virtual Value note() const = 0;
+    /// Whether it uploads a file or downloads one.
+    [[nodiscard]] virtual bool isUpload() const = 0;
+};
+
+/// Is told how the transfers go, on the session's delegate queue.
+class BackgroundSessionDelegate {
+public:
+    virtual ~BackgroundSessionDelegate() = default;
+    /// `sent` of `expected` bytes of an upload's body have left.
+    virtual void taskDidSendBodyData(const std::shared_ptr<BackgroundTask>&, std::uint64_t /*sent*/,
+                                     std::uint64_t /*expected*/)
+    {}
+    /// A download's body is in `file`, which is removed when this returns: move it, or copy it, here. Called for any
+    /// HTTP status, before taskDidComplete.
+    virtual void taskDidFinishDownloading(const std::shared_ptr<BackgroundTask>&, const std::filesystem::path& /*file*/,
+                                          const UrlResponse&)
+    {}
+    /// The task has ended; once for every task, also for one of an earlier process. A response of any HTTP status is a
+    /// completion without error. Once this has returned, the task is forgotten on disk too; a process killed before
+    /// that reports the task again.
+    virtual void taskDidComplete(const std::shared_ptr<BackgroundTask>& task,
+                                 const std::optional<UrlResponse>& response, const std::optional<Error>& error) = 0;
+    /// No task is left of those that the session knew.
+    virtual void sessionDidFinishEvents() {}
+    /// The session's store can't be opened, or is another process's: it works in a temporary directory, and tasks end
+    /// with the process. Where that isn't possible either, new tasks are errors.
+    virtual void sessionDidBecomeInvalid(const Error&) {}
+};
+
+struct BackgroundSessionConfiguration {
+    std::string identifier;    ///< names the session's store; one session of that name for each user
+    bool allowsMetered = true; ///< else tasks wait while the network is metered
+    /// Without anything sent or received for this long an attempt ends, and another is made later.
+    Duration requestTimeout = std::chrono::seconds(60);
+    /// From its resume on, waiting included, a task may take this long; then it ends with kUrlTimedOut.
+    Duration resourceTimeout = std::chrono::hours(24 * 7);
+    std::size_t maximumResponseSize = 64u << 20; ///< bytes of a download, or of an upload's answer
+    /// Tasks kept at once, and the bytes of their bodies. Past either a new task is an error.
+    std::size_t maximumTasks = 10'000;
+    std::uint64_t maximumBodyBytes = 256u << 20;
+    unsigned parallelTransfers = 2;
+    std::string caFile; ///< as for UrlSessionConfiguration
+};
+
+/// Uploads and downloads that survive the process. Any thread but the run loop's: making a task writes to disk.
+///
+/// A task is on disk, with its own copy of its body, before it is handed out; nothing moves before `resume()`. Tasks
+/// resumed by an earlier process go on when the session is made anew, and report to the delegate then; tasks that were
+/// made and never resumed are dropped at that time, their bodies with them.
+///
+/// A resumed task waits while the network is absent (and metered, where that isn't allowed). An attempt that fails
+/// below HTTP is made again after growing, jittered delays, until the resource time-out; what can't get better (a bad
+/// URL, a forbidden redirect, an answer too large) ends the task with its error. An HTTP status always ends the task;
+/// where it comes with Retry-After (RFC 9110, 10.2.3; a day at most), the session's other tasks to that host wait.
+///
+/// An attempt that was under way when the process died is made again, with the same body: a service may see a body
+/// twice, never a part of it as the whole. How a task ended is on disk before its owner is told.
+///
+/// The resource time-out is of lived time (`LivedTime`): suspend and days without the process count, leaps of the
+/// system clock don't. Destroying the session stops its transfers, for the next session of that name to take up.
+class BackgroundSession {
+public:
+    virtual ~BackgroundSession() = default;
+    /// Uploads the contents of `body` (not followed where it is a link), which the caller may remove at once.
+    [[nodiscard]] virtual Result<std::shared_ptr<BackgroundTask>> uploadTask(UrlRequest request,
+                                                                             const std::filesystem::path& body) = 0;
+    [[nodiscard]] virtual Result<std::shared_ptr<BackgroundTask>> downloadTask(UrlRequest request) = 0;
+    /// The tasks that have not ended. Calls back on the delegate queue's executor, never inside the call and never on
+    /// the delegate queue itself.
+    virtual void getTasks(std::move_only_function<void(std::vector<std::shared_ptr<BackgroundTask>>)> callback) = 0;
+};
+
+/// Makes background sessions. One for the process. Any thread.
+class BackgroundSessions {
+public:
+    virtual ~BackgroundSessions() = default;
+    /// `delegate` is told of the transfers on `delegateQueue`, a serial queue; those of an earlier process are taken up
+    /// now. Where the store can't be opened, the session's tasks end with the process and the delegate is told. The
+    /// store is opened on a worker, and made with the first task.
+    [[nodiscard]] virtual std::shared_ptr<BackgroundSession> make(BackgroundSessionConfiguration configuration,
+                                                                  std::weak_ptr<BackgroundSessionDelegate> delegate,
+                                                                  std::shared_ptr<Queue> delegateQueue) = 0;
+};
+
+/// What background sessions work with; all of it must outlive them.
+struct BackgroundEnvironment {
+    UrlLoader& loader;
+    NetworkStatus& network;
+    Clock& clock;
+    Executor& executor;
+    std::filesystem::path directory; ///< holds a directory for each session; made when there is something to keep
+    std::filesystem::path temporary; ///< where a session works whose store can't be opened
+};
+
+[[nodiscard]] std::unique_ptr<BackgroundSessions> makeBackgroundSessions(BackgroundEnvironment environment);
+
+} // namespace platform

@@ -1,0 +1,98 @@
+#pragma once
+
+#include <cstdint>
+#include <filesystem>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "platform/files/Files.h"
+#include "platform/files/Sqlite.h"
+#include "platform/net/UrlSession.h"
+#include "platform/run/LivedTime.h"
+
+namespace platform {
+
+/// A background task, as it is kept on disk. Times are counts of the store's `LivedTime`.
+struct StoredTask {
+    /// How it ended; its owner has not been told yet.
+    struct Outcome {
+        std::optional<UrlResponse> response;
+        std::optional<Error> error;
+    };
+
+    std::uint64_t identifier = 0;
+    bool isUpload = false;
+    std::shared_ptr<const UrlRequest> request;
+    std::uint64_t bodySize = 0; ///< bytes of an upload
+    Value note;
+    bool resumed = false;
+    Duration deadline{}; ///< of a resumed task
+    unsigned failures = 0;
+    Duration notBefore{}; ///< when the next attempt may begin
+    std::optional<Outcome> outcome;
+};
+
+/// The tasks of one background session on disk: a directory (0700) with a database of the tasks and one file (0600) for
+/// each body. What a call reports done outlives a kill and a power cut. One thread at a time.
+///
+/// The directory belongs to one process, by a lock. A damaged database is logged and begun anew. Files that belong to
+/// no task, left by a kill at the wrong moment, are removed when the store is opened.
+class BackgroundStore {
+public:
+    struct Contents {
+        std::vector<StoredTask> tasks;         ///< in order of their identifiers
+        std::map<std::string, Duration> holds; ///< hosts that asked to be left alone, and until when
+        std::optional<LivedTime::Mark> time;
+    };
+
+    /// Whether there is a store in that directory.
+    [[nodiscard]] static bool exists(const std::filesystem::path& directory);
+    /// Opens or makes it. An error where that can't be done, or another process has it open (EWOULDBLOCK).
+    [[nodiscard]] static Result<std::unique_ptr<BackgroundStore>> open(const std::filesystem::path& directory);
+    /// Makes one in a directory of its own under `parent`, which goes with the store. Those that killed processes left
+    /// there are removed.
+    [[nodiscard]] static Result<std::unique_ptr<BackgroundStore>> openTemporary(const std::filesystem::path& parent);
+    ~BackgroundStore();
+
+    /// What was in the store when it was opened. Once.
+    [[nodiscard]] Contents takeContents() { return std::exchange(_contents, {}); }
+    /// Adds the task with a copy of `body` (none: it has no body), `maximumBody` bytes at most, and sets its identifier
+    /// and size. Nothing is left of a task that couldn't be added.
+    [[nodiscard]] Result<void> add(StoredTask& task, const FileHandle* body, std::uint64_t maximumBody);
+    /// Keeps what has changed of it; the request and the body can't.
+    [[nodiscard]] Result<void> save(const StoredTask& task, const LivedTime::Mark& time);
+    [[nodiscard]] Result<void> saveHold(const std::string& host, Duration until, const LivedTime::Mark& time);
+    /// Removes the task and its files.
+    [[nodiscard]] Result<void> forget(std::uint64_t identifier);
+
+    [[nodiscard]] Result<FileHandle> openBody(const StoredTask& task) const;
+    /// Where a download's body goes.
+    [[nodiscard]] std::filesystem::path downloadPath(std::uint64_t identifier) const;
+    /// A new, empty file there, in place of what an earlier attempt left.
+    [[nodiscard]] Result<FileHandle> createDownload(std::uint64_t identifier) const;
+    /// Makes sure that the downloaded file outlives a power cut.
+    [[nodiscard]] Result<void> syncDownload(std::uint64_t identifier) const;
+
+private:
+    BackgroundStore(std::filesystem::path directory, LockedDirectory lock)
+        : _directory(std::move(directory)), _lock(std::move(lock))
+    {}
+    [[nodiscard]] Result<void> openDatabase();
+    [[nodiscard]] Result<void> checkDatabase();
+    [[nodiscard]] Result<void> load();
+    [[nodiscard]] std::filesystem::path bodyPath(std::uint64_t identifier) const;
+    [[nodiscard]] Result<void> saveTime(const LivedTime::Mark& time);
+    void sweep(const std::vector<StoredTask>& tasks) const;
+
+    std::filesystem::path _directory;
+    LockedDirectory _lock;
+    std::optional<Sqlite> _database;
+    Contents _contents;
+    bool _temporary = false;
+};
+
+} // namespace platform

@@ -1,0 +1,461 @@
+#include "platform/net/HttpCacheStore.h"
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <charconv>
+#include <cstring>
+#include <fcntl.h>
+#include <sys/mman.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <fmt/format.h>
+#include <sqlite3.h>
+
+#include "platform/base/Log.h"
+#include "platform/base/WriteAll.h"
+
+namespace platform {
+
+namespace fs = std::filesystem;
+
+namespace {
+
+constexpr const char* kIndex = "index.db";
+constexpr const char* kTemporary = "new";
+constexpr std::string_view kBodySuffix = ".body";
+/// What an entry takes beside its texts and body, about.
+constexpr std::uint64_t kEntrySize = 1024;
+/// Uses are saved with the next change, and when there are so many.
+constexpr std::size_t kMaximumUnsavedUses = 256;
+/// Mappings are kept, for making one may cost many times what is read through it; so many, and bytes of all of them.
+constexpr std::size_t kMaximumMappings = 64;
+constexpr std::size_t kMostMapped = 16u << 20;
+
+/// The small table is read whole when the index is opened, and written with every use.
+constexpr std::array kSchema{
+    "CREATE TABLE entry (id INTEGER PRIMARY KEY AUTOINCREMENT, key TEXT NOT NULL UNIQUE, size INTEGER NOT NULL,"
+    " used INTEGER NOT NULL)",
+    "CREATE INDEX entryByUse ON entry (used)",
+    "CREATE TABLE answer (id INTEGER PRIMARY KEY, status INTEGER NOT NULL, url TEXT NOT NULL, headers TEXT NOT NULL,"
+    " selecting TEXT NOT NULL, requested INTEGER NOT NULL, received INTEGER NOT NULL, bodySize INTEGER NOT NULL,"
+    " digest INTEGER NOT NULL, body TEXT)"};
+
+std::unexpected<Error> failure(const fs::path& path)
+{
+    return std::unexpected(Error::posix(errno, path.string()));
+}
+
+/// Header fields as lines; one with a line end in it can't have come by HTTP, and is left out.
+std::string linesOf(const HttpHeaders& headers)
+{
+    std::string lines;
+    for (const auto& [name, value] : headers) {
+        if (name.find_first_of(":\n") != std::string::npos || value.contains('\n')) continue;
+        lines.append(name).append(":").append(value).append("\n");
+    }
+    return lines;
+}
+
+HttpHeaders headersOf(std::string_view lines)
+{
+    HttpHeaders headers;
+    while (!lines.empty()) {
+        const std::string_view line = lines.substr(0, lines.find('\n'));
+        lines.remove_prefix(std::min(lines.size(), line.size() + 1));
+        if (const auto colon = line.find(':'); colon != std::string_view::npos)
+            headers.add(std::string(line.substr(0, colon)), std::string(line.substr(colon + 1)));
+    }
+    return headers;
+}
+
+/// Sees damage, such as pages that never came to the disk; no defence against someone who means harm. Every step maps
+/// different states to different ones, so that no single change is lost; eight at a time, for one waits for its last.
+class Digest {
+public:
+    void add(std::string_view bytes)
+    {
+        auto lanes = _lanes; // in registers
+        step(lanes[0], bytes.size());
+        for (; bytes.size() >= kBlock; bytes.remove_prefix(kBlock))
+            for (std::size_t i = 0; i < lanes.size(); ++i) {
+                std::uint64_t word = 0;
+                std::memcpy(&word, bytes.data() + i * sizeof word, sizeof word);
+                step(lanes[i], word);
+            }
+        for (const char c : bytes) step(lanes[1], static_cast<unsigned char>(c));
+        _lanes = lanes;
+    }
+    void add(std::int64_t number) { step(_lanes[2], static_cast<std::uint64_t>(number)); }
+    [[nodiscard]] std::int64_t value() const
+    {
+        std::uint64_t all = 0;
+        for (const std::uint64_t lane : _lanes) {
+            step(all, lane);
+            all ^= all >> 32;
+        }
+        return static_cast<std::int64_t>(all);
+    }
+
+private:
+    static void step(std::uint64_t& lane, std::uint64_t word) { lane = (lane ^ word) * 0x9e3779b97f4a7c15; }
+    std::array<std::uint64_t, 8> _lanes{1, 2, 3, 4, 5, 6, 7, 8};
+    static constexpr std::size_t kBlock = 64;
+};
+
+std::int64_t countOf(Date date)
+{
+    return date.time_since_epoch().count();
+}
+
+Error damaged(std::string reason)
+{
+    return Error::withReason(std::string(kSqliteErrorDomain), Sqlite::kCorrupt, std::move(reason));
+}
+
+/// The entry's number in the name of its file.
+std::optional<std::int64_t> idOf(std::string_view name)
+{
+    if (!name.ends_with(kBodySuffix)) return std::nullopt;
+    std::int64_t id = 0;
+    const char* end = name.data() + name.size() - kBodySuffix.size();
+    const auto read = std::from_chars(name.data(), end, id);
+    return read.ec == std::errc() && read.ptr == end ? std::optional(id) : std::nullopt;
+}
+
+std::string nameOf(std::int64_t id)
+{
+    return fmt::format("{}{}", id, kBodySuffix);
+}
+
+} // namespace
+
+/// Of the table "answer".
+struct HttpCacheStore::Row {
+    std::int64_t id = 0;
+    std::int64_t status = 0;
+    std::string url;
+    std::string headers;
+    std::string selecting;
+    std::int64_t requested = 0;
+    std::int64_t received = 0;
+    std::int64_t bodySize = 0;
+    std::int64_t digest = 0;
+    std::optional<std::string> body;
+
+    [[nodiscard]] std::int64_t digestWith(const std::string& key, std::string_view bytes) const
+    {
+        Digest all;
+        for (const std::string* text : {&key, &url, &headers, &selecting}) all.add(*text);
+        for (const std::int64_t number : {status, requested, received}) all.add(number);
+        all.add(bytes);
+        return all.value();
+    }
+};
+
+Result<std::unique_ptr<HttpCacheStore>> HttpCacheStore::open(const fs::path& directory, const Limits& limits)
+{
+    if (auto made = makeSystemFiles()->createDirectories(directory); !made)
+        return std::unexpected(std::move(made.error()));
+    auto lock = LockedDirectory::open(directory);
+    if (!lock) return std::unexpected(std::move(lock.error()));
+    std::unique_ptr<HttpCacheStore> store(new HttpCacheStore(directory, limits, std::move(*lock)));
+    auto opened = store->openIndex();
+    if (!opened && isDamage(opened.error())) {
+        defaultLog().error("the HTTP cache {} is damaged and begun anew: {}", directory.string(),
+                           opened.error().description());
+        opened = store->beginAnew();
+    }
+    if (!opened) return std::unexpected(std::move(opened.error()));
+    return store;
+}
+
+HttpCacheStore::~HttpCacheStore()
+{
+    if (_index && !_uses.empty()) (void)_index->transaction([this] { return saveUses(); });
+}
+
+bool HttpCacheStore::isDamage(const Error& error)
+{
+    constexpr std::array<std::int64_t, 5> kOthers{SQLITE_ERROR, SQLITE_SCHEMA, SQLITE_CONSTRAINT, SQLITE_MISMATCH,
+                                                  SQLITE_TOOBIG};
+    return Sqlite::isDamage(error) ||
+           (error.domain == kSqliteErrorDomain && std::ranges::find(kOthers, error.code) != kOthers.end());
+}
+
+bool HttpCacheStore::isInPlace() const
+{
+    struct stat status{};
+    return lstat((_directory / kIndex).c_str(), &status) == 0 && status.st_ino == _indexInode;
+}
+
+Result<void> HttpCacheStore::beginAnew()
+{
+    _index.reset();
+    _uses.clear();
+    _mappings.clear();
+    for (const std::string& name : makeSystemFiles()->list(_directory).value_or(std::vector<std::string>()))
+        if (idOf(name) || name == kTemporary || name.starts_with(kIndex))
+            unlinkat(_lock.directory.fd(), name.c_str(), 0);
+    return openIndex();
+}
+
+Result<void> HttpCacheStore::openIndex()
+{
+    auto index = Sqlite::open(_directory / kIndex);
+    if (!index) return std::unexpected(std::move(index.error()));
+    _index.emplace(std::move(*index));
+    struct stat status{};
+    if (fstatat(_lock.directory.fd(), kIndex, &status, AT_SYMLINK_NOFOLLOW) != 0) return failure(_directory / kIndex);
+    _indexInode = status.st_ino;
+    (void)_index->execute("PRAGMA synchronous = NORMAL"); // consistent after a power cut, if not of the last moment
+
+    std::vector<std::string> schema;
+    auto done =
+        _index->run("SELECT sql FROM sqlite_schema WHERE sql IS NOT NULL AND name NOT LIKE 'sqlite\\_%' ESCAPE '\\'"
+                    " ORDER BY rowid",
+                    {}, [&](const Sqlite::Row& row) { schema.emplace_back(row.text(0)); });
+    if (done && schema.empty())
+        done = _index->transaction([&] {
+            Result<void> made;
+            for (const char* statement : kSchema)
+                if (made) made = _index->execute(statement);
+            return made;
+        });
+    else if (done && !std::ranges::equal(schema, kSchema))
+        done = std::unexpected(damaged("the index has other tables"));
+    return done ? sweep() : std::move(done);
+}
+
+Result<void> HttpCacheStore::sweep()
+{
+    _size = 0;
+    _lastUse = 0;
+    bool sound = true;
+    std::vector<std::int64_t> ids;
+    auto read = _index->run("SELECT id, size, used FROM entry ORDER BY id", {}, [&](const Sqlite::Row& row) {
+        const std::int64_t size = row.integer(1);
+        sound = sound && size >= 0 && size <= static_cast<std::int64_t>(_limits.capacity) && row.integer(2) >= 0 &&
+                row.integer(2) < INT64_MAX / 2;
+        _size += static_cast<std::uint64_t>(std::max<std::int64_t>(size, 0));
+        _lastUse = std::max(_lastUse, row.integer(2));
+        ids.push_back(row.integer(0));
+    });
+    if (!read) return read;
+    if (!sound) return std::unexpected(damaged("sizes or uses out of range"));
+    for (const std::string& name : makeSystemFiles()->list(_directory).value_or(std::vector<std::string>())) {
+        const auto id = idOf(name);
+        if ((id && !std::ranges::binary_search(ids, *id)) || name == kTemporary)
+            unlinkat(_lock.directory.fd(), name.c_str(), 0);
+    }
+    return {};
+}
+
+Result<std::vector<std::string>> HttpCacheStore::keys()
+{
+    std::vector<std::string> keys;
+    auto read =
+        _index->run("SELECT key FROM entry", {}, [&](const Sqlite::Row& row) { keys.emplace_back(row.text(0)); });
+    if (!read) return std::unexpected(std::move(read.error()));
+    return keys;
+}
+
+Result<std::shared_ptr<const StoredResponse>> HttpCacheStore::find(const std::string& key, const Url& likely)
+{
+    std::optional<Row> row;
+    auto read =
+        _index->run("SELECT answer.id, status, url, headers, selecting, requested, received, bodySize, digest, body"
+                    " FROM entry JOIN answer ON answer.id = entry.id WHERE key = ?",
+                    {std::string_view(key)}, [&](const Sqlite::Row& found) {
+                        const auto text = [&](int column) { return std::string(found.text(column)); };
+                        row = Row{.id = found.integer(0),
+                                  .status = found.integer(1),
+                                  .url = text(2),
+                                  .headers = text(3),
+                                  .selecting = text(4),
+                                  .requested = found.integer(5),
+                                  .received = found.integer(6),
+                                  .bodySize = found.integer(7),
+                                  .digest = found.integer(8)};
+                        if (!found.isNull(9)) row->body = text(9);
+                    });
+    if (!read) {
+        // A file that became shorter than its index says.
+        if (read.error().code == SQLITE_IOERR) return std::unexpected(damaged("the index can't be read"));
+        return std::unexpected(std::move(read.error()));
+    }
+    if (!row) return nullptr;
+
+    const bool mapped = !row->body;
+    std::optional<Bytes> body =
+        mapped ? mapBody(row->id, static_cast<std::uint64_t>(row->bodySize)) : Bytes(std::move(*row->body));
+    auto url = row->url == likely.string() ? std::optional(likely) : Url::parse(row->url);
+    if (!body || !url || row->digestWith(key, body->view()) != row->digest) {
+        defaultLog().error("an answer in the HTTP cache is damaged and dropped: {}", row->id);
+        if (auto removed = remove(key); !removed) return std::unexpected(std::move(removed.error()));
+        return nullptr;
+    }
+    noteUse(key);
+    auto stored = std::make_shared<StoredResponse>();
+    stored->response = {
+        .url = std::move(*url), .statusCode = static_cast<int>(row->status), .headers = headersOf(row->headers)};
+    stored->body = std::move(*body);
+    stored->selecting = std::move(row->selecting);
+    stored->requested = Date(Duration(row->requested));
+    stored->received = Date(Duration(row->received));
+    stored->mapped = mapped;
+    return stored;
+}
+
+Result<std::vector<std::string>> HttpCacheStore::put(const std::string& key, const StoredResponse& stored)
+{
+    const std::string_view body = stored.body.view();
+    Row row{.status = stored.response.statusCode,
+            .url = stored.response.url.string(),
+            .headers = linesOf(stored.response.headers),
+            .selecting = stored.selecting,
+            .requested = countOf(stored.requested),
+            .received = countOf(stored.received),
+            .bodySize = static_cast<std::int64_t>(body.size())};
+    row.digest = row.digestWith(key, body);
+    const std::uint64_t size =
+        kEntrySize + key.size() + row.url.size() + row.headers.size() + row.selecting.size() + body.size();
+    const bool asFile = body.size() >= _limits.minimumMappedSize;
+
+    std::vector<std::int64_t> old;
+    std::vector<std::string> evicted;
+    std::uint64_t total = _size;
+    const auto drop = [&](const Sqlite::Row& entry) {
+        old.push_back(entry.integer(0));
+        total -= std::min(total, static_cast<std::uint64_t>(std::max<std::int64_t>(entry.integer(1), 0)));
+    };
+    auto done = _index->transaction([&]() -> Result<void> {
+        auto step = saveUses();
+        if (step) step = _index->run("SELECT id, size FROM entry WHERE key = ?", {std::string_view(key)}, drop);
+        for (std::int64_t last = -1, begin = -2; step && total + size > _limits.capacity && last != begin;) {
+            begin = last;
+            step = _index->run("SELECT id, size, key, used FROM entry WHERE used > ? ORDER BY used LIMIT 16", {last},
+                               [&](const Sqlite::Row& entry) {
+                                   last = entry.integer(3);
+                                   if (total + size <= _limits.capacity || entry.text(2) == key) return;
+                                   drop(entry);
+                                   evicted.emplace_back(entry.text(2));
+                               });
+        }
+        if (step) step = forget(old);
+        if (step)
+            step = _index->run("INSERT INTO entry (key, size, used) VALUES (?, ?, ?)",
+                               {std::string_view(key), static_cast<std::int64_t>(size), ++_lastUse});
+        if (!step) return step;
+        row.id = _index->lastInsertedRow();
+        if (asFile)
+            if (auto written = writeBody(row.id, body); !written) return written;
+        return _index->run("INSERT INTO answer VALUES (?, ?, ?, ?, ?, ?, ?, ?, ?, ?)",
+                           {row.id, row.status, std::string_view(row.url), std::string_view(row.headers),
+                            std::string_view(row.selecting), row.requested, row.received, row.bodySize, row.digest,
+                            asFile ? Sqlite::Parameter() : Sqlite::Parameter(body)});
+    });
+    if (!done) {
+        if (row.id != 0) removeBody(row.id);
+        return std::unexpected(std::move(done.error()));
+    }
+    for (const std::int64_t id : old) removeBody(id);
+    _size = total + size;
+    return evicted;
+}
+
+Result<void> HttpCacheStore::remove(const std::string& key)
+{
+    std::vector<std::int64_t> old;
+    std::uint64_t size = 0;
+    auto done = _index->transaction([&] {
+        auto step = _index->run("SELECT id, size FROM entry WHERE key = ?", {std::string_view(key)},
+                                [&](const Sqlite::Row& entry) {
+                                    old.push_back(entry.integer(0));
+                                    size += static_cast<std::uint64_t>(std::max<std::int64_t>(entry.integer(1), 0));
+                                });
+        return step ? forget(old) : std::move(step);
+    });
+    if (!done) return done;
+    for (const std::int64_t id : old) removeBody(id);
+    _size -= std::min(_size, size);
+    _uses.erase(key);
+    return {};
+}
+
+void HttpCacheStore::noteUse(const std::string& key)
+{
+    _uses[key] = ++_lastUse;
+    if (_uses.size() >= kMaximumUnsavedUses) (void)_index->transaction([this] { return saveUses(); });
+}
+
+Result<void> HttpCacheStore::saveUses()
+{
+    for (const auto& [key, use] : std::exchange(_uses, {}))
+        if (auto saved = _index->run("UPDATE entry SET used = ? WHERE key = ?", {use, std::string_view(key)}); !saved)
+            return saved;
+    return {};
+}
+
+Result<void> HttpCacheStore::forget(const std::vector<std::int64_t>& ids)
+{
+    for (const std::int64_t id : ids) {
+        auto gone = _index->run("DELETE FROM entry WHERE id = ?", {id});
+        if (gone) gone = _index->run("DELETE FROM answer WHERE id = ?", {id});
+        if (!gone) return gone;
+    }
+    return {};
+}
+
+Result<void> HttpCacheStore::writeBody(std::int64_t id, std::string_view body) const
+{
+    const int directory = _lock.directory.fd();
+    const FileHandle file(
+        openat(directory, kTemporary, O_WRONLY | O_CREAT | O_TRUNC | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, 0600));
+    if (file && writeAll(file.fd(), body) && renameat(directory, kTemporary, directory, nameOf(id).c_str()) == 0)
+        return {};
+    auto failed = failure(_directory / nameOf(id));
+    unlinkat(directory, kTemporary, 0);
+    return failed;
+}
+
+/// None where the file isn't there whole. A mapping that was kept is read only where its file still is.
+std::optional<Bytes> HttpCacheStore::mapBody(std::int64_t id, std::uint64_t size)
+{
+    struct stat status{};
+    const std::string name = nameOf(id);
+    if (const auto kept = std::ranges::find(_mappings, id, &Mapping::id); kept != _mappings.end()) {
+        if (fstatat(_lock.directory.fd(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0 &&
+            status.st_ino == kept->inode && static_cast<std::uint64_t>(status.st_size) == size &&
+            kept->body.size() == size) {
+            _mappings.splice(_mappings.begin(), _mappings, kept);
+            return kept->body;
+        }
+        _mappings.erase(kept);
+    }
+    const FileHandle file(openat(_lock.directory.fd(), name.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
+    if (!file || fstat(file.fd(), &status) != 0 || !S_ISREG(status.st_mode) ||
+        static_cast<std::uint64_t>(status.st_size) != size)
+        return std::nullopt;
+    if (size == 0) return Bytes();
+    void* bytes = mmap(nullptr, size, PROT_READ, MAP_PRIVATE | MAP_POPULATE, file.fd(), 0);
+    if (bytes == MAP_FAILED) return std::nullopt;
+    Bytes body(
+        std::shared_ptr<const void>(bytes, [size](const void* mapped) { munmap(const_cast<void*>(mapped), size); }),
+        std::string_view(static_cast<const char*>(bytes), size));
+    _mappings.push_front({id, status.st_ino, body});
+    std::size_t all = 0;
+    for (const Mapping& mapping : _mappings) all += mapping.body.size();
+    for (; _mappings.size() > kMaximumMappings || all > kMostMapped; _mappings.pop_back())
+        all -= _mappings.back().body.size();
+    return body;
+}
+
+void HttpCacheStore::removeBody(std::int64_t id)
+{
+    std::erase_if(_mappings, [id](const Mapping& mapping) { return mapping.id == id; });
+    unlinkat(_lock.directory.fd(), nameOf(id).c_str(), 0);
+}
+
+} // namespace platform

@@ -1,0 +1,84 @@
+#pragma once
+
+#include <cstdint>
+#include <filesystem>
+#include <list>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/files/Files.h"
+#include "platform/files/Sqlite.h"
+#include "platform/net/HttpCachePolicy.h"
+
+namespace platform {
+
+/// Kept answers on disk: a directory (0700) with an index, a SQLite database that also has the small bodies, and one
+/// file (0600) for each of the others. One thread at a time.
+///
+/// The directory belongs to one process, by a lock. Nothing is synced: what a power cut leaves is found to be damaged,
+/// or missing, when it is read. What is damaged is logged and dropped, be it one answer or the index with all of them.
+/// Files that belong to no answer are removed when the directory is opened.
+class HttpCacheStore {
+public:
+    struct Limits {
+        std::uint64_t capacity = 0;        ///< bytes of all answers; past it those go that were used least recently
+        std::size_t minimumMappedSize = 0; ///< bodies of so many bytes are files of their own
+    };
+
+    /// Opens or makes it. An error where that can't be done, or another process has it open (EWOULDBLOCK).
+    [[nodiscard]] static Result<std::unique_ptr<HttpCacheStore>> open(const std::filesystem::path& directory,
+                                                                      const Limits& limits);
+    /// Notes what was used.
+    ~HttpCacheStore();
+
+    /// Of all answers, in no order.
+    [[nodiscard]] Result<std::vector<std::string>> keys();
+    /// Null where there is none, or it is damaged. An answer whose URL is `likely`, too, needn't parse it.
+    [[nodiscard]] Result<std::shared_ptr<const StoredResponse>> find(const std::string& key, const Url& likely = {});
+    /// Keeps the answer in place of an earlier one; answers the keys of those that had to go for it.
+    [[nodiscard]] Result<std::vector<std::string>> put(const std::string& key, const StoredResponse& stored);
+    [[nodiscard]] Result<void> remove(const std::string& key);
+    /// It was used elsewhere.
+    void noteUse(const std::string& key);
+
+    /// False once someone took the directory or the index away.
+    [[nodiscard]] bool isInPlace() const;
+    /// Whether an error says that the index isn't, or is no longer, what was written.
+    [[nodiscard]] static bool isDamage(const Error& error);
+    /// Removes all and begins with an empty index.
+    [[nodiscard]] Result<void> beginAnew();
+
+private:
+    struct Row;
+    struct Mapping {
+        std::int64_t id;
+        std::uint64_t inode;
+        Bytes body;
+    };
+    HttpCacheStore(std::filesystem::path directory, const Limits& limits, LockedDirectory lock)
+        : _directory(std::move(directory)), _limits(limits), _lock(std::move(lock))
+    {}
+    [[nodiscard]] Result<void> openIndex();
+    [[nodiscard]] Result<void> sweep();
+    [[nodiscard]] Result<void> writeBody(std::int64_t id, std::string_view body) const;
+    [[nodiscard]] std::optional<Bytes> mapBody(std::int64_t id, std::uint64_t size);
+    void removeBody(std::int64_t id);
+    /// Forgets the entries; their files go with `removeBody`, once that has been committed.
+    [[nodiscard]] Result<void> forget(const std::vector<std::int64_t>& ids);
+    [[nodiscard]] Result<void> saveUses();
+
+    std::filesystem::path _directory;
+    const Limits _limits;
+    LockedDirectory _lock;
+    std::optional<Sqlite> _index;
+    std::uint64_t _indexInode = 0;
+    std::uint64_t _size = 0; // of all entries
+    std::int64_t _lastUse = 0;
+    std::map<std::string, std::int64_t> _uses; // not in the index yet
+    std::list<Mapping> _mappings;              // of the bodies found last, the latest first
+};
+
+} // namespace platform

@@ -1,0 +1,304 @@
+#include "platform/net/UrlSessionCaching.h"
+
+#include <mutex>
+#include <utility>
+
+#include "platform/net/CurlSupport.h"
+#include "platform/net/HttpCache.h"
+#include "platform/run/Queue.h"
+#include "platform/values/Dictionary.h"
+
+namespace platform {
+
+namespace {
+
+using Stored = std::shared_ptr<const StoredResponse>;
+
+/// Keeps the answer if that may be done.
+void fill(HttpCache& cache, const UrlRequest& request, const Bytes& data, const UrlResponse& response, Date requested,
+          bool hadStored)
+{
+    // After a redirect it is the answer of where that led.
+    const Date received = cache.now();
+    if (isStorable(request, response, received)) {
+        StoredResponse stored;
+        stored.response = response;
+        stored.body = data;
+        stored.selecting = selectingFields(response, request).value_or("");
+        stored.requested = requested;
+        stored.received = received;
+        cache.store(response.url, std::move(stored));
+    } else if (hadStored && response.statusCode < 400) {
+        cache.remove(request.url); // it has been replaced
+    }
+}
+
+/// Bytes that depend on no file: nobody knows how long the task's owner, or a confirmation, keeps them.
+Stored inMemory(Stored stored)
+{
+    if (!stored->mapped) return stored;
+    auto copy = std::make_shared<StoredResponse>(*stored);
+    copy->body = Bytes(std::string(stored->body.view()));
+    copy->mapped = false;
+    return copy;
+}
+
+/// When an answer from the cache was asked for and there.
+Value timingFromCache(double start)
+{
+    const double end = monotonicSeconds();
+    return Dictionary{{"_kCFNTimingDataFetchStart", start},    {"_kCFNTimingDataRedirectStart", 0.0},
+                      {"_kCFNTimingDataRedirectEnd", 0.0},     {"_kCFNTimingDataDomainLookupStart", 0.0},
+                      {"_kCFNTimingDataDomainLookupEnd", 0.0}, {"_kCFNTimingDataConnectStart", 0.0},
+                      {"_kCFNTimingDataConnectEnd", 0.0},      {"_kCFNTimingDataSecureConnectionStart", 0.0},
+                      {"_kCFNTimingDataRequestStart", 0.0},    {"_kCFNTimingDataResponseStart", 0.0},
+                      {"_kCFNTimingDataResponseEnd", end},     {"_kCFNTimingDataConnectionReused", false}};
+}
+
+/// A task that asks the cache. It ends once, by whoever takes the completion first under the mutex:
+///
+///     suspended ──resume──► asking ──nothing, or stale──► loading ──► ended
+///         └──────cancel──────┴──fresh, or cancel────────────────────────┘
+///
+/// While it is loading a cancel is the load's affair. An answer that turns out not to confirm what it should is loaded
+/// again, without a condition.
+class CachingTask final : public UrlTask, public std::enable_shared_from_this<CachingTask> {
+public:
+    CachingTask(std::shared_ptr<UrlSession> loads, std::shared_ptr<HttpCache> cache,
+                std::shared_ptr<Queue> delegateQueue, UrlRequest request, UrlSession::DataCompletion completion)
+        : _loads(std::move(loads)), _cache(std::move(cache)), _delegateQueue(std::move(delegateQueue)),
+          _request(std::move(request)), _completion(std::move(completion))
+    {}
+    /// Makes the load, whose number is the task's. Once, before anything else.
+    void prepare()
+    {
+        _load = makeLoad(_request);
+        _identifier = _load->identifier();
+    }
+
+    void resume() override
+    {
+        {
+            std::lock_guard lock(_mutex);
+            if (_state != State::Suspended) return;
+            _state = State::Asking;
+        }
+        _start = monotonicSeconds();
+        _cache->lookUp(_request.url, [self = shared_from_this()](Stored stored) { self->lookedUp(std::move(stored)); });
+    }
+
+    void cancel() override
+    {
+        std::shared_ptr<UrlTask> load;
+        {
+            std::lock_guard lock(_mutex);
+            _cancelled = true;
+            if (_state == State::Loading) load = _load;
+        }
+        if (load) return load->cancel();
+        end(std::nullopt, std::nullopt, urlError(kUrlCancelled, "cancelled"), Value());
+    }
+
+    [[nodiscard]] std::uint64_t identifier() const override { return _identifier; }
+    [[nodiscard]] const UrlRequest& originalRequest() const override { return _request; }
+    [[nodiscard]] Value timingData() const override
+    {
+        std::lock_guard lock(_mutex);
+        return _timing;
+    }
+
+private:
+    enum class State { Suspended, Asking, Loading, Ended };
+
+    [[nodiscard]] std::shared_ptr<UrlTask> makeLoad(UrlRequest request)
+    {
+        // Weakly, for a load that is never resumed never lets go of it.
+        return _loads->dataTask(std::move(request), [weak = weak_from_this()](auto data, auto response, auto error) {
+            if (const auto self = weak.lock()) self->loaded(std::move(data), std::move(response), std::move(error));
+        });
+    }
+
+    void lookedUp(Stored stored)
+    {
+        const Reuse worth = stored ? reuse(*stored, _request, _cache->now()) : Reuse::None;
+        if (worth != Reuse::None) stored = inMemory(std::move(stored));
+        if (worth == Reuse::Answer) return end(stored->body, stored->response, std::nullopt, timingFromCache(_start));
+        _stored = std::move(stored);
+        _confirming = worth == Reuse::Confirm;
+        load(_confirming ? makeLoad(confirmationRequest(*_stored, _request)) : nullptr);
+    }
+
+    /// Goes over to loading, with the load made before if there is no other.
+    void load(std::shared_ptr<UrlTask> other)
+    {
+        std::shared_ptr<UrlTask> resumed;
+        _requested = _cache->now();
+        {
+            std::lock_guard lock(_mutex);
+            if (_state == State::Ended || _cancelled) return; // who cancelled it ends it
+            _state = State::Loading;
+            if (other) _load = std::move(other);
+            _self = shared_from_this();
+            resumed = _load;
+        }
+        resumed->resume();
+    }
+
+    /// On the delegate queue.
+    void loaded(std::optional<Bytes> data, std::optional<UrlResponse> response, std::optional<Error> error)
+    {
+        std::shared_ptr<UrlTask> finished;
+        {
+            std::lock_guard lock(_mutex);
+            finished = _load;
+        }
+        if (!error && data && response) {
+            const bool direct = cacheKey(response->url) == cacheKey(_request.url);
+            if (_confirming && response->statusCode == 304) {
+                if (!direct || !confirms(*response, *_stored)) return loadUnconditionally();
+                const StoredResponse stored = confirmed(*_stored, *response, _requested, _cache->now());
+                if (isStorable(_request, stored.response, stored.received))
+                    _cache->store(_request.url, stored);
+                else
+                    _cache->remove(_request.url);
+                data = stored.body;
+                response = stored.response;
+            } else {
+                fill(*_cache, _request, *data, *response, _requested, _stored && direct);
+            }
+        }
+        finish(std::move(data), std::move(response), std::move(error), finished->timingData());
+    }
+
+    void loadUnconditionally()
+    {
+        _confirming = false;
+        auto again = makeLoad(_request);
+        bool cancelled = false;
+        {
+            std::lock_guard lock(_mutex);
+            _load = std::move(again);
+            cancelled = _cancelled;
+        }
+        if (cancelled) return finish(std::nullopt, std::nullopt, urlError(kUrlCancelled, "cancelled"), Value());
+        load(nullptr);
+    }
+
+    /// Ends it at once, on the delegate queue. Only the load does so.
+    void finish(std::optional<Bytes> data, std::optional<UrlResponse> response, std::optional<Error> error,
+                Value timing)
+    {
+        std::shared_ptr<CachingTask> self;
+        {
+            std::lock_guard lock(_mutex);
+            _state = State::Ended;
+            _timing = std::move(timing);
+            self = std::move(_self);
+        }
+        _stored.reset();
+        auto completion = std::exchange(_completion, {});
+        completion(std::move(data), std::move(response), std::move(error));
+    }
+
+    /// Ends it, if nobody did, in a task of the delegate queue. Not while it is loading.
+    void end(std::optional<Bytes> data, std::optional<UrlResponse> response, std::optional<Error> error, Value timing)
+    {
+        {
+            std::lock_guard lock(_mutex);
+            if (_state == State::Loading || _state == State::Ended) return;
+            _state = State::Ended;
+            _timing = std::move(timing);
+        }
+        _delegateQueue->async([self = shared_from_this(), data = std::move(data), response = std::move(response),
+                               error = std::move(error)]() mutable {
+            // Moved out first: the completion may be what keeps the task's owner alive.
+            auto completion = std::exchange(self->_completion, {});
+            completion(std::move(data), std::move(response), std::move(error));
+        });
+    }
+
+    const std::shared_ptr<UrlSession> _loads;
+    const std::shared_ptr<HttpCache> _cache;
+    const std::shared_ptr<Queue> _delegateQueue;
+    const UrlRequest _request;
+    std::uint64_t _identifier = 0;
+    UrlSession::DataCompletion _completion; // whoever ends it
+    double _start = 0;                      // set before the cache is asked, like the next ones before the load
+    Stored _stored;
+    bool _confirming = false;
+    Date _requested;
+
+    mutable std::mutex _mutex;
+    State _state = State::Suspended;    // under the mutex
+    bool _cancelled = false;            // under the mutex
+    std::shared_ptr<UrlTask> _load;     // under the mutex
+    std::shared_ptr<CachingTask> _self; // under the mutex; while it is loading
+    Value _timing;                      // under the mutex
+};
+
+class CachingSession final : public UrlSession {
+public:
+    CachingSession(std::shared_ptr<UrlSession> loads, std::shared_ptr<HttpCache> cache,
+                   std::shared_ptr<Queue> delegateQueue)
+        : _loads(std::move(loads)), _cache(std::move(cache)), _delegateQueue(std::move(delegateQueue))
+    {}
+
+    std::shared_ptr<UrlTask> dataTask(UrlRequest request, DataCompletion completion) override
+    {
+        switch (cacheUse(request)) {
+        case CacheUse::None: break;
+        case CacheUse::Ask: {
+            auto task = std::make_shared<CachingTask>(_loads, _cache, _delegateQueue, std::move(request),
+                                                      std::move(completion));
+            task->prepare();
+            return task;
+        }
+        case CacheUse::Fill: completion = filling(request, std::move(completion)); break;
+        case CacheUse::Invalidate: completion = invalidating(request.url, std::move(completion)); break;
+        }
+        return _loads->dataTask(std::move(request), std::move(completion));
+    }
+    std::shared_ptr<UrlTask> transferTask(UrlRequest request, TransferFiles files, DataCompletion completion) override
+    {
+        if (cacheUse(request) == CacheUse::Invalidate) completion = invalidating(request.url, std::move(completion));
+        return _loads->transferTask(std::move(request), std::move(files), std::move(completion));
+    }
+    [[nodiscard]] std::shared_ptr<HttpCache> cache() const override { return _cache; }
+
+private:
+    [[nodiscard]] DataCompletion filling(const UrlRequest& request, DataCompletion completion) const
+    {
+        return [cache = _cache, request, requested = _cache->now(),
+                completion = std::move(completion)](auto data, auto response, auto error) mutable {
+            if (!error && data && response)
+                fill(*cache, request, *data, *response, requested, cacheKey(response->url) == cacheKey(request.url));
+            completion(std::move(data), std::move(response), std::move(error));
+        };
+    }
+    [[nodiscard]] DataCompletion invalidating(const Url& url, DataCompletion completion) const
+    {
+        return [cache = _cache, url, completion = std::move(completion)](auto data, auto response, auto error) mutable {
+            if (!error && response) {
+                const bool redirected = cacheKey(response->url) != cacheKey(url);
+                const bool done = response->statusCode >= 200 && response->statusCode < 400;
+                if (done || redirected) cache->remove(url);
+                if (done && redirected) cache->remove(response->url);
+            }
+            completion(std::move(data), std::move(response), std::move(error));
+        };
+    }
+
+    const std::shared_ptr<UrlSession> _loads;
+    const std::shared_ptr<HttpCache> _cache;
+    const std::shared_ptr<Queue> _delegateQueue;
+};
+
+} // namespace
+
+std::shared_ptr<UrlSession> makeCachingSession(std::shared_ptr<UrlSession> loads, std::shared_ptr<HttpCache> cache,
+                                               std::shared_ptr<Queue> delegateQueue)
+{
+    return std::make_shared<CachingSession>(std::move(loads), std::move(cache), std::move(delegateQueue));
+}
+
+} // namespace platform

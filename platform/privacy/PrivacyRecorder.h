@@ -1,0 +1,62 @@
+#pragma once
+
+#include <filesystem>
+#include <functional>
+#include <set>
+#include <span>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/privacy/PrivacyLedger.h"
+#include "platform/privacy/RandomizedResponse.h"
+#include "platform/values/Error.h"
+
+namespace platform {
+
+class Clock;
+class FileSystem;
+
+/// Fills the bytes; false where there is no randomness, and then nothing may rely on them. Any thread.
+using RandomBytes = std::function<bool(std::span<std::uint8_t>)>;
+/// From the cryptographic generator.
+[[nodiscard]] bool systemRandomBytes(std::span<std::uint8_t> bytes);
+
+/// Domain of the recorder's own errors.
+inline constexpr std::string_view kPrivacyErrorDomain = "Privacy";
+inline constexpr std::int64_t kPrivacyBudgetExhausted = 1;
+inline constexpr std::int64_t kPrivacyNoRandomness = 2;
+
+/// Notes texts in a way that tells much of many devices and little of this one (docs/privacy.md).
+///
+/// Its directory has two files (0600), each replaced whole: "ledger", which must not leave the device, and
+/// "reports.json", which may. Keys and texts are in neither: a report is noise around one bit, to which both are
+/// hashed. The reports of 30 days are kept; nothing here sends them anywhere.
+///
+/// The budget is the device's, whatever the keys. It is debited on disk before a report is written: a kill or a failure
+/// in between costs the reports. Where the ledger is damaged or can't be had nothing is recorded, until someone removes
+/// it, which makes a new device of this one.
+///
+/// One thread at a time. Of several processes one records; the others fail meanwhile (EWOULDBLOCK).
+class PrivacyRecorder {
+public:
+    PrivacyRecorder(FileSystem& files, Clock& clock, std::filesystem::path directory,
+                    RandomBytes random = systemRandomBytes);
+
+    /// Records texts under a key. Where the budget has not enough left for all, a random choice of them. An error where
+    /// it has nothing left (`kPrivacyBudgetExhausted`) and where nothing could be recorded for another reason.
+    [[nodiscard]] Result<void> record(std::string_view key, const std::set<std::string>& texts);
+
+private:
+    [[nodiscard]] Result<PrivacyLedger> readLedger() const;
+    [[nodiscard]] Result<std::vector<PrivacyReport>> privatise(const DeviceSecret& secret, std::string_view key,
+                                                               const std::set<std::string>& texts, int count) const;
+    [[nodiscard]] Result<void> addReports(const std::vector<PrivacyReport>& reports);
+
+    FileSystem& _files;
+    Clock& _clock;
+    const std::filesystem::path _directory;
+    const RandomBytes _random;
+};
+
+} // namespace platform

@@ -1,0 +1,32 @@
+#pragma once
+
+#include <cstdint>
+#include <functional>
+
+#include "platform/base/Date.h"
+
+namespace platform {
+
+/// Where every service takes the time from.
+///
+/// wallNow() follows the system clock and jumps with it. hostTicks() counts nanoseconds of being awake: it stops
+/// in suspend and no clock change moves it. after() counts on hostTicks(). Any thread.
+class Clock {
+public:
+    virtual ~Clock() = default;
+
+    [[nodiscard]] virtual Date wallNow() const = 0;
+    [[nodiscard]] virtual std::uint64_t hostTicks() const = 0;
+
+    /// Identifies a pending timer; 0 is none.
+    using TimerId = std::uint64_t;
+
+    /// Calls `fire` once, `delay` from now (a delay of zero or less: as soon as possible). It is called on the
+    /// clock's own thread, so it must only hand work on: services use `Queue::after`.
+    virtual TimerId after(Duration delay, std::move_only_function<void()> fire) = 0;
+
+    /// Forgets a pending timer and destroys its callback; false if it has fired or is firing.
+    virtual bool cancel(TimerId timer) = 0;
+};
+
+} // namespace platform

@@ -1,0 +1,341 @@
+#include "platform/run/Queue.h"
+
+#include <algorithm>
+#include <atomic>
+#include <condition_variable>
+#include <cstdio>
+#include <cstdlib>
+#include <deque>
+#include <mutex>
+#include <ranges>
+#include <utility>
+#include <vector>
+
+#include "platform/base/ThreadName.h"
+#include "platform/run/Clock.h"
+
+namespace platform {
+
+namespace {
+
+/// Tasks that one drain job runs before it gives its worker back.
+constexpr unsigned kBatch = 32;
+/// Drain jobs that one concurrent queue has with the executor at a time.
+constexpr std::size_t kMaximumJobs = 64;
+
+/// The queues whose tasks this thread is in, innermost first.
+struct Frame {
+    explicit Frame(Queue* queue_) : queue(queue_), outer(top) { top = this; }
+    ~Frame() { top = outer; }
+    Queue* queue;
+    Frame* outer;
+    static thread_local Frame* top;
+};
+thread_local Frame* Frame::top = nullptr;
+
+[[noreturn]] void abortWith(const char* what, const std::string& label)
+{
+    std::fprintf(stderr, "queue %s: %s\n", label.c_str(), what);
+    std::abort();
+}
+
+} // namespace
+
+/// A queue that is held back, by the event that it waits for and by a timer; whichever comes first lets it go on. The
+/// timer owns it, so that an event that never happens holds nothing.
+struct Suspension {
+    std::shared_ptr<Queue> queue;
+    Queue::Task continuation;
+    std::atomic<bool> over = false;
+    std::atomic<Clock::TimerId> timer = 0;
+    void (*resumeQueue)(Suspension&);
+
+    void resume()
+    {
+        if (!over.exchange(true)) resumeQueue(*this);
+    }
+};
+
+struct Event::State {
+    std::mutex mutex;
+    bool signalled = false;
+    std::vector<std::weak_ptr<Suspension>> waiters;
+};
+
+Event::Event() : _state(std::make_shared<State>()) {}
+Event::~Event() = default;
+
+void Event::signal()
+{
+    std::vector<std::weak_ptr<Suspension>> waiters;
+    {
+        std::lock_guard lock(_state->mutex);
+        _state->signalled = true;
+        waiters.swap(_state->waiters);
+    }
+    for (const auto& waiter : waiters)
+        if (const auto suspension = waiter.lock()) suspension->resume();
+}
+
+bool Event::signalled() const
+{
+    std::lock_guard lock(_state->mutex);
+    return _state->signalled;
+}
+
+/// A `sync` caller that waits for its turn. On the caller's stack; touched under the queue's mutex.
+struct SyncWaiter {
+    std::condition_variable wake;
+    bool granted = false;  // its turn has come, and it counts as running
+    bool mayDrain = false; // nobody else drains what stands before it
+};
+
+/// One place in the queue: a task, or a caller that waits to run its own.
+struct Entry {
+    Queue::Task task;
+    SyncWaiter* waiter = nullptr;
+    bool barrier = false;
+};
+
+/// Drain jobs for the executor, submitted when this is destroyed at the latest: with the queue's mutex free, so that
+/// the worker that wakes doesn't run into it. Declared ahead of the lock.
+class Queue::Jobs {
+public:
+    explicit Jobs(Queue& queue) : _queue(queue) {}
+    ~Jobs() { submit(); }
+    Jobs(const Jobs&) = delete;
+    Jobs& operator=(const Jobs&) = delete;
+    void submit();
+    unsigned count = 0;
+
+private:
+    Queue& _queue;
+};
+
+/// A serial queue is a concurrent one whose every task is a barrier. What runs is counted in `shared` and `exclusive`;
+/// who ends a task calls `pump`, which gives the next place its turn: a waiting caller directly, a task through the
+/// first caller that waits behind it, or else through a job for the executor.
+struct Queue::Core {
+    std::string label;
+    Kind kind;
+    Executor& executor;
+    Clock& clock;
+    Priority priority;
+
+    std::mutex mutex;
+    std::deque<Entry> entries;
+    std::size_t waiters = 0;                                // entries that are waiting callers
+    std::size_t jobs = 0;                                   // drain jobs handed to the executor and not begun
+    unsigned shared = 0;                                    // shared tasks running
+    bool exclusive = false;                                 // a barrier task running
+    std::vector<std::shared_ptr<Suspension>> suspensions{}; ///< in the order in which their continuations are to run
+
+    [[nodiscard]] bool mayStart(bool barrier) const
+    {
+        return suspensions.empty() && !exclusive && (!barrier || shared == 0);
+    }
+    [[nodiscard]] bool headMayStart() const { return !entries.empty() && mayStart(entries.front().barrier); }
+
+    void begin(bool barrier)
+    {
+        if (barrier)
+            exclusive = true;
+        else
+            ++shared;
+    }
+    void end(bool barrier)
+    {
+        if (barrier)
+            exclusive = false;
+        else
+            --shared;
+    }
+
+    Entry take()
+    {
+        Entry entry = std::move(entries.front());
+        entries.pop_front();
+        if (entry.waiter) --waiters;
+        begin(entry.barrier);
+        return entry;
+    }
+
+    void pump(Jobs& handedOver)
+    {
+        while (headMayStart() && entries.front().waiter) {
+            SyncWaiter* waiter = take().waiter;
+            waiter->granted = true;
+            waiter->wake.notify_one();
+        }
+        if (!headMayStart()) return;
+        if (waiters > 0) {
+            const auto first = std::ranges::find_if(entries, [](const Entry& entry) { return entry.waiter; });
+            first->waiter->mayDrain = true;
+            first->waiter->wake.notify_one();
+            if (kind == Kind::Serial) return;
+        }
+        const std::size_t wanted = kind == Kind::Serial ? 1 : std::min(entries.size() - waiters, kMaximumJobs);
+        for (; jobs < wanted; ++jobs) ++handedOver.count;
+    }
+
+    /// Runs a task with the mutex released; the task is destroyed before it is taken again.
+    void run(Queue& queue, Entry entry, std::unique_lock<std::mutex>& lock)
+    {
+        lock.unlock();
+        {
+            Frame frame(&queue);
+            Task task = std::move(entry.task);
+            task();
+        }
+        lock.lock();
+        end(entry.barrier);
+    }
+
+    /// A drain job, on a worker.
+    void drain(Queue& queue)
+    {
+        setThreadNameForLabel(label);
+        Jobs handedOver(queue);
+        std::unique_lock lock(mutex);
+        --jobs;
+        for (unsigned i = 0; i < kBatch && headMayStart() && !entries.front().waiter; ++i) run(queue, take(), lock);
+        pump(handedOver);
+    }
+};
+
+std::shared_ptr<Queue> Queue::make(std::string label, Kind kind, Executor& executor, Clock& clock, Priority priority)
+{
+    auto core = std::unique_ptr<Core>(
+        new Core{.label = std::move(label), .kind = kind, .executor = executor, .clock = clock, .priority = priority});
+    return std::shared_ptr<Queue>(new Queue(std::move(core)));
+}
+
+void Queue::Jobs::submit()
+{
+    for (; count > 0; --count)
+        _queue._core->executor.execute(_queue._core->priority,
+                                       [self = _queue.shared_from_this()] { self->_core->drain(*self); });
+}
+
+Queue::Queue(std::unique_ptr<Core> core) : _core(std::move(core)) {}
+Queue::~Queue() = default;
+
+const std::string& Queue::label() const
+{
+    return _core->label;
+}
+
+void Queue::async(Task task)
+{
+    Jobs handedOver(*this);
+    std::lock_guard lock(_core->mutex);
+    _core->entries.push_back({.task = std::move(task), .barrier = _core->kind == Kind::Serial});
+    _core->pump(handedOver);
+}
+
+void Queue::barrierAsync(Task task)
+{
+    Jobs handedOver(*this);
+    std::lock_guard lock(_core->mutex);
+    _core->entries.push_back({.task = std::move(task), .barrier = true});
+    _core->pump(handedOver);
+}
+
+void Queue::runSync(TaskRef task, bool barrier)
+{
+    if (isCurrent()) abortWith("sync from a task of its own", label());
+    Core& core = *_core;
+    barrier = barrier || core.kind == Kind::Serial;
+
+    Jobs handedOver(*this);
+    std::unique_lock lock(core.mutex);
+    if (core.entries.empty() && core.mayStart(barrier)) {
+        core.begin(barrier);
+    } else {
+        SyncWaiter self;
+        core.entries.push_back({.waiter = &self, .barrier = barrier});
+        ++core.waiters;
+        while (!self.granted) {
+            if (!core.headMayStart()) {
+                self.wake.wait(lock, [&] { return self.granted || self.mayDrain; });
+                self.mayDrain = false;
+                continue;
+            }
+            if (core.entries.front().waiter) {
+                core.pump(handedOver);
+                lock.unlock();
+                handedOver.submit();
+                lock.lock();
+                continue;
+            }
+            core.run(*this, core.take(), lock);
+        }
+    }
+    lock.unlock();
+    {
+        Frame frame(this);
+        task();
+    }
+    lock.lock();
+    core.end(barrier);
+    core.pump(handedOver);
+}
+
+void Queue::after(Duration delay, Task task)
+{
+    _core->clock.after(delay,
+                       [self = shared_from_this(), task = std::move(task)]() mutable { self->async(std::move(task)); });
+}
+
+void Queue::suspendUntil(const Event& event, Duration timeout, Task continuation)
+{
+    if (_core->kind != Kind::Serial) abortWith("suspendUntil needs a serial queue", label());
+    assertOnQueue();
+
+    auto suspension = std::make_shared<Suspension>();
+    suspension->queue = shared_from_this();
+    suspension->continuation = std::move(continuation);
+    suspension->resumeQueue = [](Suspension& over) {
+        Core& core = *over.queue->_core;
+        core.clock.cancel(over.timer);
+        Jobs handedOver(*over.queue);
+        std::lock_guard lock(core.mutex);
+        if (!std::ranges::all_of(core.suspensions, [](const auto& other) { return other->over.load(); })) return;
+        for (const auto& ended : std::exchange(core.suspensions, {}) | std::views::reverse)
+            core.entries.push_front({.task = std::move(ended->continuation), .barrier = true});
+        core.pump(handedOver);
+    };
+    {
+        std::lock_guard lock(_core->mutex);
+        _core->suspensions.push_back(suspension);
+    }
+    suspension->timer = _core->clock.after(timeout, [suspension] { suspension->resume(); });
+    {
+        std::lock_guard lock(event._state->mutex);
+        if (!event._state->signalled) {
+            std::erase_if(event._state->waiters, [](const auto& waiter) { return waiter.expired(); });
+            event._state->waiters.push_back(suspension);
+            return;
+        }
+    }
+    suspension->resume();
+}
+
+std::shared_ptr<Queue> Queue::current()
+{
+    return Frame::top ? Frame::top->queue->shared_from_this() : nullptr;
+}
+
+bool Queue::isCurrent() const
+{
+    for (const Frame* frame = Frame::top; frame; frame = frame->outer)
+        if (frame->queue == this) return true;
+    return false;
+}
+
+void Queue::assertOnQueue() const
+{
+    if (!isCurrent()) abortWith("not on the queue", label());
+}
+
+} // namespace platform

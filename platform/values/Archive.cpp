@@ -1,0 +1,523 @@
+#include "platform/values/Archive.h"
+
+#include <array>
+#include <bit>
+#include <concepts>
+#include <cstring>
+
+#include <fmt/format.h>
+#include <msgpack.hpp>
+
+#include "platform/values/Dictionary.h"
+#include "platform/values/Record.h"
+
+/// Archives: MessagePack. A record is a map whose first key is "class"; a date is a timestamp, the extension type -1.
+namespace platform {
+
+namespace {
+
+constexpr std::string_view kClassKey = "class";
+constexpr std::int8_t kTimestamp = -1;
+constexpr std::int64_t kNanosecondsPerSecond = 1'000'000'000;
+
+// Writing
+
+class ArchiveEncoder final : public Encoder {
+public:
+    void beginRecord(std::string_view className, std::size_t) override
+    {
+        // A map with a count of 16 bits, which is known when the record ends.
+        _records.push_back({.start = _stream.bytes.size(), .entries = 1});
+        _stream.bytes.append("\xde\0\0", 3);
+        packText(kClassKey);
+        packText(className);
+    }
+    void key(std::string_view name) override
+    {
+        _keyStart = _stream.bytes.size();
+        packText(name);
+        _keyEnd = _stream.bytes.size();
+        ++_records.back().entries;
+    }
+    void endRecord() override
+    {
+        store(_stream.bytes.data() + _records.back().start + 1, _records.back().entries);
+        _records.pop_back();
+    }
+    void beginArray(std::size_t count) override { _packer.pack_array(static_cast<std::uint32_t>(count)); }
+    void endArray() override {}
+    /// A field that is null is left out: its key goes again.
+    void null() override
+    {
+        if (_stream.bytes.size() != _keyEnd) {
+            _packer.pack_nil();
+            return;
+        }
+        _stream.bytes.resize(_keyStart);
+        _keyEnd = std::string::npos;
+        --_records.back().entries;
+    }
+    void boolean(bool value) override { value ? _packer.pack_true() : _packer.pack_false(); }
+    void integer(std::int64_t value) override { _packer.pack_int64(value); }
+    void unsignedInteger(std::uint64_t value) override { _packer.pack_uint64(value); }
+    void real(double value) override
+    {
+        // The packer would write a whole number as an integer, and the value would come back as another type.
+        std::array<char, 9> number{'\xcb'};
+        store(number.data() + 1, std::bit_cast<std::uint64_t>(value));
+        _stream.write(number.data(), number.size());
+    }
+    void string(std::string_view value) override { packText(value); }
+    void bytes(const Bytes& value) override
+    {
+        _packer.pack_bin(static_cast<std::uint32_t>(value.size()));
+        _packer.pack_bin_body(value.data(), static_cast<std::uint32_t>(value.size()));
+    }
+    void date(Date value) override
+    {
+        // The 96-bit form holds every date.
+        const std::int64_t count = value.time_since_epoch().count();
+        const std::int64_t rest = count % kNanosecondsPerSecond;
+        const std::int64_t seconds = count / kNanosecondsPerSecond - (rest < 0 ? 1 : 0);
+        std::array<char, 12> body;
+        store(body.data(), static_cast<std::uint32_t>(rest < 0 ? rest + kNanosecondsPerSecond : rest));
+        store(body.data() + 4, static_cast<std::uint64_t>(seconds));
+        _packer.pack_ext(body.size(), kTimestamp);
+        _packer.pack_ext_body(body.data(), body.size());
+    }
+    void value(const Value& value) override
+    {
+        switch (value.type()) {
+        case Value::Type::Null: return null();
+        case Value::Type::Bool: return boolean(*value.asBool());
+        case Value::Type::Int: return integer(*value.asInt());
+        case Value::Type::UInt: return unsignedInteger(*value.asUInt());
+        case Value::Type::Double: return real(*value.asDouble());
+        case Value::Type::String: return string(*value.asString());
+        case Value::Type::Bytes: return bytes(*value.asBytes());
+        case Value::Type::Date: return date(*value.asDate());
+        case Value::Type::Array:
+            beginArray(value.count());
+            for (const Value& element : *value.asArray()) this->value(element);
+            return;
+        case Value::Type::Dictionary:
+            _packer.pack_map(static_cast<std::uint32_t>(value.count()));
+            for (const auto& [name, entry] : *value.asDictionary()) {
+                packText(name);
+                this->value(entry);
+            }
+            return;
+        }
+    }
+
+    [[nodiscard]] std::string take() { return std::move(_stream.bytes); }
+
+private:
+    struct Stream {
+        void write(const char* from, std::size_t count) { bytes.append(from, count); }
+        std::string bytes;
+    };
+    struct OpenRecord {
+        std::size_t start;
+        std::uint16_t entries;
+    };
+
+    void packText(std::string_view text)
+    {
+        _packer.pack_str(static_cast<std::uint32_t>(text.size()));
+        _packer.pack_str_body(text.data(), static_cast<std::uint32_t>(text.size()));
+    }
+
+    template <class Number> static void store(char* to, Number number)
+    {
+        for (std::size_t i = sizeof(Number); i > 0; number = static_cast<Number>(number >> 8))
+            to[--i] = static_cast<char>(number & 0xff);
+    }
+
+    Stream _stream;
+    msgpack::packer<Stream> _packer{_stream};
+    std::vector<OpenRecord> _records;
+    std::size_t _keyStart = 0;
+    std::size_t _keyEnd = std::string::npos; ///< where the bytes end right behind a field's key
+};
+
+// Reading
+
+/// One value of an archive, or the head of a container, whose contents follow it.
+struct Token {
+    Value::Type type = Value::Type::Null;
+    std::uint32_t size = 0; ///< bytes of a string or bytes; elements of an array; entries of a dictionary
+    union {
+        std::int64_t integer = 0; ///< of a date: nanoseconds since 1970
+        bool boolean;
+        std::uint64_t unsignedInteger;
+        double real;
+        const char* bytes; ///< in the archive
+    };
+
+    [[nodiscard]] std::string_view text() const { return {bytes, size}; }
+    /// How many values follow that belong to this one.
+    [[nodiscard]] std::uint64_t contents() const
+    {
+        return type == Value::Type::Array ? size : type == Value::Type::Dictionary ? std::uint64_t{size} * 2 : 0;
+    }
+};
+
+/// Big-endian number.
+template <std::unsigned_integral Number> Number load(const char* from)
+{
+    Number number;
+    std::memcpy(&number, from, sizeof(number));
+    return std::endian::native == std::endian::little ? std::byteswap(number) : number;
+}
+
+/// What the first byte of a value says of those that follow.
+struct Head {
+    Value::Type type = Value::Type::Null;
+    std::uint8_t width = 0; ///< bytes of the number or length behind the first byte
+    bool isSigned = false;
+    bool isKnown = true;
+    std::uint32_t number = 0; ///< where the first byte has it
+};
+
+/// MessagePack's table of first bytes (https://msgpack.org).
+constexpr Head headOf(unsigned first)
+{
+    using enum Value::Type;
+    const auto widthIn = [first](unsigned base) { return static_cast<std::uint8_t>(1u << (first - base)); };
+    if (first <= 0x7f) return {.type = Int, .number = first};
+    if (first <= 0x8f) return {.type = Dictionary, .number = first & 0x0f};
+    if (first <= 0x9f) return {.type = Array, .number = first & 0x0f};
+    if (first <= 0xbf) return {.type = String, .number = first & 0x1f};
+    if (first == 0xc0) return {};
+    if (first == 0xc1) return {.isKnown = false};
+    if (first <= 0xc3) return {.type = Bool, .number = first & 1};
+    if (first <= 0xc6) return {.type = Bytes, .width = widthIn(0xc4)};
+    if (first <= 0xc9) return {.type = Date, .width = widthIn(0xc7)};
+    if (first <= 0xcb) return {.type = Double, .width = static_cast<std::uint8_t>(first == 0xca ? 4 : 8)};
+    if (first <= 0xcf) return {.type = UInt, .width = widthIn(0xcc)};
+    if (first <= 0xd3) return {.type = Int, .width = widthIn(0xd0), .isSigned = true};
+    if (first <= 0xd8) return {.type = Date, .number = 1u << (first - 0xd4)};
+    if (first <= 0xdb) return {.type = String, .width = widthIn(0xd9)};
+    if (first <= 0xdd) return {.type = Array, .width = widthIn(0xdb)};
+    if (first <= 0xdf) return {.type = Dictionary, .width = widthIn(0xdd)};
+    return {.type = Int, .isSigned = true, .number = first};
+}
+
+constexpr auto kHeads = [] {
+    std::array<Head, 256> heads;
+    for (unsigned first = 0; first < heads.size(); ++first) heads[first] = headOf(first);
+    return heads;
+}();
+
+/// Reads an archive value by value. The library's own parsers read it whole, into objects or for a visitor, so that
+/// what records ask for one by one would have to be kept first; that took a third of the time.
+class ArchiveDecoder final : public Decoder {
+public:
+    /// `archive` must outlive the decoder.
+    ArchiveDecoder(std::string_view archive, const RecordClasses& classes)
+        : Decoder(classes), _next(archive.data()), _end(_next + archive.size()), _valuesLeft(archive.size())
+    {}
+
+    /// Says that nothing is to follow what was read.
+    void finish()
+    {
+        if (!failed() && (_isRead || _next != _end)) fail("trailing bytes");
+    }
+
+    bool null() override
+    {
+        if (here().type != Value::Type::Null || failed()) return false;
+        _isRead = false;
+        return true;
+    }
+    bool boolean() override { return take(Value::Type::Bool, "a boolean").boolean; }
+    std::int64_t integer() override
+    {
+        if (here().type == Value::Type::UInt) fail("number out of range");
+        return take(Value::Type::Int, "an integer").integer;
+    }
+    std::uint64_t unsignedInteger() override
+    {
+        if (here().type == Value::Type::UInt) return take(Value::Type::UInt, "an integer").unsignedInteger;
+        if (here().type == Value::Type::Int && here().integer < 0) fail("number out of range");
+        return take(Value::Type::Int, "an integer").unsignedInteger;
+    }
+    double real() override
+    {
+        if (here().type == Value::Type::Int) return static_cast<double>(take(Value::Type::Int, "a double").integer);
+        if (here().type == Value::Type::UInt)
+            return static_cast<double>(take(Value::Type::UInt, "a double").unsignedInteger);
+        return take(Value::Type::Double, "a double").real;
+    }
+    std::string string() override { return std::string(take(Value::Type::String, "a string").text()); }
+    Bytes bytes() override { return Bytes(std::string(take(Value::Type::Bytes, "bytes").text())); }
+    Date date() override { return Date(Duration(take(Value::Type::Date, "a date").integer)); }
+    Value value() override { return value(kMaximumDepth); }
+    /// The value at hand, whose arrays and dictionaries may nest `levels` deep.
+    Value value(std::size_t levels)
+    {
+        const Token token = here();
+        if (failed()) return {};
+        if (token.type >= Value::Type::Array && levels == 0) {
+            fail("nested too deep");
+            return {};
+        }
+        _isRead = false;
+        switch (token.type) {
+        case Value::Type::Null: return {};
+        case Value::Type::Bool: return token.boolean;
+        case Value::Type::Int: return token.integer;
+        case Value::Type::UInt: return token.unsignedInteger;
+        case Value::Type::Double: return token.real;
+        case Value::Type::String: return token.text();
+        case Value::Type::Bytes: return Bytes(std::string(token.text()));
+        case Value::Type::Date: return Date(Duration(token.integer));
+        case Value::Type::Array: {
+            Value::Array array;
+            array.reserve(token.size);
+            for (std::uint32_t i = 0; i < token.size; ++i) array.push_back(value(levels - 1));
+            return array;
+        }
+        case Value::Type::Dictionary: {
+            Dictionary dictionary;
+            dictionary.reserve(token.size);
+            for (std::uint32_t i = 0; i < token.size; ++i) {
+                std::string key = string();
+                dictionary.set(std::move(key), value(levels - 1));
+            }
+            return dictionary;
+        }
+        }
+        return {};
+    }
+
+    void skip() override
+    {
+        for (std::uint64_t left = 1; left > 0; --left) {
+            left += here().contents();
+            if (failed()) return;
+            _isRead = false;
+        }
+    }
+
+    bool isRecord() override
+    {
+        const Token first = here();
+        if (first.type != Value::Type::Dictionary || first.size == 0) return false;
+        const char* const contents = _next;
+        const std::uint64_t valuesLeft = _valuesLeft;
+        const auto isText = [this] {
+            _isRead = false;
+            return here().type == Value::Type::String;
+        };
+        const bool isClass = isText() && _here.text() == kClassKey && isText();
+        // Back to where it was.
+        _here = first;
+        _isRead = true;
+        _next = contents;
+        _valuesLeft = valuesLeft;
+        return isClass;
+    }
+
+    std::string_view beginRecord() override
+    {
+        const std::uint32_t size = here().size;
+        take(Value::Type::Dictionary, "a record");
+        if (!failed() && (size == 0 || take(Value::Type::String, "a key").text() != kClassKey))
+            fail("record without a class");
+        const std::string_view className = take(Value::Type::String, "a class name").text();
+        enter(size - 1);
+        return className;
+    }
+
+    bool nextKey(std::string_view& name) override
+    {
+        if (!nextElement()) return false;
+        if (takeShortText(name)) return true; // as nearly every key is
+        name = take(Value::Type::String, "a key").text();
+        return !failed();
+    }
+
+    std::size_t beginArray() override
+    {
+        const std::uint32_t size = take(Value::Type::Array, "an array").size;
+        enter(size);
+        return size;
+    }
+
+    bool nextElement() override
+    {
+        if (failed()) return false;
+        if (_left.back() > 0) return _left.back()-- > 0;
+        _left.pop_back();
+        return false;
+    }
+
+private:
+    /// The token at hand; null after a failure.
+    const Token& here()
+    {
+        if (!_isRead && !failed()) [[likely]]
+            read();
+        if (failed()) [[unlikely]]
+            _here = {};
+        return _here;
+    }
+
+    /// The token at hand, which must be of that type; an empty one after a failure.
+    Token take(Value::Type type, std::string_view expected)
+    {
+        const Token& token = here();
+        if (token.type != type) [[unlikely]]
+            failExpecting(expected, token.type);
+        if (failed()) [[unlikely]]
+            return {};
+        _isRead = false;
+        return token;
+    }
+
+    /// Takes what comes next if it is a text whose length is in its first byte; false leaves it.
+    bool takeShortText(std::string_view& text)
+    {
+        if (_isRead || _next == _end) return false;
+        const Head& head = kHeads[static_cast<unsigned char>(*_next)];
+        if (head.type != Value::Type::String || head.width > 0 || head.number >= _end - _next) return false;
+        text = {_next + 1, head.number};
+        _next += 1 + head.number;
+        return true;
+    }
+
+    void read()
+    {
+        _isRead = true;
+        if (_next == _end) return fail("truncated");
+        const Head& head = kHeads[static_cast<unsigned char>(*_next++)];
+        if (head.width > _end - _next) return fail("truncated");
+        const std::uint64_t number = numberBehind(head);
+        _next += head.width;
+        _here = {.type = head.type};
+        switch (head.type) {
+        case Value::Type::Null:
+            if (!head.isKnown) fail("not an archive");
+            return;
+        case Value::Type::Bool: _here.boolean = number != 0; return;
+        case Value::Type::Int: _here.integer = static_cast<std::int64_t>(number); return;
+        case Value::Type::UInt:
+            if (number <= INT64_MAX) _here.type = Value::Type::Int;
+            _here.unsignedInteger = number;
+            return;
+        case Value::Type::Double:
+            _here.real = head.width == 4 ? double{std::bit_cast<float>(static_cast<std::uint32_t>(number))}
+                                         : std::bit_cast<double>(number);
+            return;
+        case Value::Type::Date: ++_next; [[fallthrough]]; // the type of the extension
+        case Value::Type::String:
+        case Value::Type::Bytes:
+            if (_next > _end || number > static_cast<std::uint64_t>(_end - _next)) return fail("truncated");
+            _here.size = static_cast<std::uint32_t>(number);
+            _here.bytes = _next;
+            _next += number;
+            if (head.type == Value::Type::Date) readDate();
+            return;
+        case Value::Type::Array:
+        case Value::Type::Dictionary:
+            _here.size = static_cast<std::uint32_t>(number);
+            // A value takes a byte at least. All containers together can't declare more of them, whoever reserves them.
+            if (_here.contents() > _valuesLeft) return fail("truncated");
+            _valuesLeft -= _here.contents();
+            return;
+        }
+    }
+
+    /// The number behind the first byte, with its sign where it has one, or that in it.
+    [[nodiscard]] std::uint64_t numberBehind(const Head& head) const
+    {
+        const auto signedAs = [&head](auto number) -> std::uint64_t {
+            using Signed = std::make_signed_t<decltype(number)>;
+            return head.isSigned ? static_cast<std::uint64_t>(std::int64_t{static_cast<Signed>(number)}) : number;
+        };
+        switch (head.width) {
+        case 1: return signedAs(load<std::uint8_t>(_next));
+        case 2: return signedAs(load<std::uint16_t>(_next));
+        case 4: return signedAs(load<std::uint32_t>(_next));
+        case 8: return load<std::uint64_t>(_next);
+        default: return signedAs(static_cast<std::uint8_t>(head.number));
+        }
+    }
+
+    /// Makes a date of the extension at hand: a timestamp of 4, 8 or 12 bytes.
+    void readDate()
+    {
+        const char* body = _here.bytes;
+        std::int64_t seconds = 0;
+        std::uint64_t nanoseconds = 0;
+        if (static_cast<std::int8_t>(body[-1]) != kTimestamp) return fail("unknown extension type");
+        if (_here.size == 4) {
+            seconds = load<std::uint32_t>(body);
+        } else if (_here.size == 8) {
+            seconds = static_cast<std::int64_t>(load<std::uint64_t>(body) & ((std::uint64_t{1} << 34) - 1));
+            nanoseconds = load<std::uint64_t>(body) >> 34;
+        } else if (_here.size == 12) {
+            nanoseconds = load<std::uint32_t>(body);
+            seconds = static_cast<std::int64_t>(load<std::uint64_t>(body + 4));
+        } else {
+            return fail("broken date");
+        }
+        const __int128 total = static_cast<__int128>(seconds) * kNanosecondsPerSecond + nanoseconds;
+        if (nanoseconds >= kNanosecondsPerSecond || total < INT64_MIN || total > INT64_MAX)
+            return fail("date out of range");
+        _here.integer = static_cast<std::int64_t>(total);
+    }
+
+    /// Enters a container of `size` elements or fields.
+    void enter(std::uint32_t size)
+    {
+        if (_left.size() == kMaximumDepth) fail("nested too deep");
+        _left.push_back(size);
+    }
+
+    const char* _next;
+    const char* const _end;
+    std::uint64_t _valuesLeft; ///< that containers may still declare
+    Token _here;
+    bool _isRead = false;             ///< `_here` is the next value, and `_next` is behind it
+    std::vector<std::uint32_t> _left; ///< what is left to read of each container that was entered
+};
+
+} // namespace
+
+std::string archive(const Record& record)
+{
+    ArchiveEncoder encoder;
+    encodeRecord(encoder, record);
+    return encoder.take();
+}
+
+Result<std::shared_ptr<Record>> unarchive(std::string_view bytes, const RecordClasses& classes)
+{
+    ArchiveDecoder decoder(bytes, classes);
+    auto record = decodeRecord(decoder);
+    decoder.finish();
+    if (auto error = decoder.error()) return std::unexpected(std::move(*error));
+    return record;
+}
+
+std::string archiveValue(const Value& value)
+{
+    ArchiveEncoder encoder;
+    encoder.value(value);
+    return encoder.take();
+}
+
+Result<Value> valueFromArchive(std::string_view bytes)
+{
+    static const RecordClasses kNone;
+    ArchiveDecoder decoder(bytes, kNone);
+    Value value = decoder.value(2 * kMaximumDepth); // records that nest, and a value in the innermost
+    decoder.finish();
+    if (auto error = decoder.error()) return std::unexpected(std::move(*error));
+    return value;
+}
+
+} // namespace platform

@@ -1,0 +1,32 @@
+#include "platform/values/Error.h"
+
+#include <system_error>
+
+#include <fmt/format.h>
+
+namespace platform {
+
+Error Error::withReason(std::string domain, std::int64_t code, std::string reason)
+{
+    return {std::move(domain), code, Value::dictionaryOf({{"reason", std::move(reason)}})};
+}
+
+Error Error::posix(int errnum, std::string_view what)
+{
+    const std::string text = std::generic_category().message(errnum);
+    return withReason(std::string(kPosixErrorDomain), errnum, what.empty() ? text : fmt::format("{}: {}", what, text));
+}
+
+std::string Error::reason() const
+{
+    const std::string* text = userInfo["reason"].asString();
+    return text ? *text : std::string();
+}
+
+std::string Error::description() const
+{
+    const std::string text = reason();
+    return text.empty() ? fmt::format("{} {}", domain, code) : fmt::format("{} {}: {}", domain, code, text);
+}
+
+} // namespace platform

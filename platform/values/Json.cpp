@@ -1,0 +1,398 @@
+#include "platform/values/Json.h"
+
+#include <algorithm>
+#include <array>
+#include <charconv>
+#include <cmath>
+#include <cstring>
+
+#include <fmt/format.h>
+#include <openssl/evp.h>
+#include <simdjson.h>
+
+#include "platform/values/Dictionary.h"
+#include "platform/values/Error.h"
+
+namespace platform {
+
+namespace {
+
+// Reading
+
+namespace dom = simdjson::dom;
+
+/// A thread keeps a parser for documents up to this size; it needs some 15 bytes of memory for each of them.
+constexpr std::size_t kKeptParserCapacity = 64u << 10;
+
+/// The parser that this thread has kept.
+thread_local std::unique_ptr<dom::parser> keptParser;
+
+std::unexpected<Error> malformed(std::string reason)
+{
+    return std::unexpected(Error::withReason(std::string(kFormatErrorDomain), kFormatMalformed, std::move(reason)));
+}
+
+/// Counts levels, unlike the parser, which leaves out containers that are empty.
+bool nestsDeeper(dom::element element, std::size_t levels)
+{
+    if (dom::array array; element.get(array) == simdjson::SUCCESS)
+        return levels == 0 ||
+               std::ranges::any_of(array, [levels](auto inner) { return nestsDeeper(inner, levels - 1); });
+    if (dom::object object; element.get(object) == simdjson::SUCCESS)
+        return levels == 0 ||
+               std::ranges::any_of(object, [levels](auto entry) { return nestsDeeper(entry.value, levels - 1); });
+    return false;
+}
+
+simdjson::error_code parseBounded(dom::parser& parser, std::string_view text, dom::element& root)
+{
+    // Documents of so few levels that an empty container is no level too many; nearly every one is.
+    if (parser.max_depth() != kMaximumDepth)
+        if (const auto error = parser.allocate(parser.capacity(), kMaximumDepth)) return error;
+    auto error = parser.parse(text.data(), text.size()).get(root);
+    if (error != simdjson::DEPTH_ERROR) return error;
+
+    error = parser.allocate(parser.capacity(), kMaximumDepth + 1);
+    if (!error) error = parser.parse(text.data(), text.size()).get(root);
+    return !error && nestsDeeper(root, kMaximumDepth) ? simdjson::DEPTH_ERROR : error;
+}
+
+Value convert(dom::element element);
+
+Value convertArray(dom::array array)
+{
+    Value::Array elements;
+    elements.reserve(array.size());
+    for (const dom::element element : array) elements.push_back(convert(element));
+    return elements;
+}
+
+Value convertObject(dom::object object)
+{
+    Dictionary entries;
+    entries.reserve(object.size());
+    for (const auto& [key, element] : object) entries.set(std::string(key), convert(element));
+    return entries;
+}
+
+Value convert(dom::element element)
+{
+    switch (element.type()) {
+    case dom::element_type::ARRAY: return convertArray(element.get_array().value_unsafe());
+    case dom::element_type::OBJECT: return convertObject(element.get_object().value_unsafe());
+    case dom::element_type::INT64: return element.get_int64().value_unsafe();
+    case dom::element_type::UINT64: return element.get_uint64().value_unsafe();
+    case dom::element_type::DOUBLE: return element.get_double().value_unsafe();
+    case dom::element_type::STRING: return element.get_string().value_unsafe();
+    case dom::element_type::BOOL: return element.get_bool().value_unsafe();
+    case dom::element_type::NULL_VALUE: break;
+    }
+    return {};
+}
+
+// Writing
+
+/// What a byte of a string needs.
+enum class Escape : std::uint8_t { None, Short, Unicode };
+
+constexpr auto kEscapes = [] {
+    std::array<Escape, 256> escapes{};
+    for (int c = 0; c < 0x20; ++c) escapes[c] = Escape::Unicode;
+    for (const unsigned char c : {'"', '\\', '\b', '\f', '\n', '\r', '\t'}) escapes[c] = Escape::Short;
+    return escapes;
+}();
+
+constexpr char shortEscape(char c)
+{
+    switch (c) {
+    case '\b': return 'b';
+    case '\f': return 'f';
+    case '\n': return 'n';
+    case '\r': return 'r';
+    case '\t': return 't';
+    default: return c;
+    }
+}
+
+/// `text` with U+FFFD in place of each byte that is no part of valid UTF-8.
+std::string repaired(std::string_view text)
+{
+    std::string valid;
+    valid.reserve(text.size() + 16);
+    for (std::size_t i = 0; i < text.size();) {
+        const auto lead = static_cast<unsigned char>(text[i]);
+        const std::size_t length = lead < 0x80 ? 1 : lead < 0xe0 ? 2 : lead < 0xf0 ? 3 : 4;
+        const std::string_view character = text.substr(i, length);
+        if (character.size() == length && simdjson::validate_utf8(character)) {
+            valid += character;
+            i += length;
+        } else {
+            valid += "\xef\xbf\xbd";
+            ++i;
+        }
+    }
+    return valid;
+}
+
+/// Collects the text.
+struct TextSink {
+    std::string text;
+    void put(char c) { text += c; }
+    void put(std::string_view part) { text += part; }
+};
+
+/// Counts its bytes only.
+struct CountingSink {
+    std::size_t count = 0;
+    void put(char) { ++count; }
+    void put(std::string_view part) { count += part.size(); }
+};
+
+template <class Sink> class JsonWriter {
+public:
+    JsonWriter(Sink& sink, JsonStyle style) : _sink(sink), _pretty(style == JsonStyle::Pretty) {}
+
+    void write(const Value& value)
+    {
+        switch (value.type()) {
+        case Value::Type::Null: return _sink.put("null");
+        case Value::Type::Bool: return _sink.put(*value.asBool() ? "true" : "false");
+        case Value::Type::Int: return writeNumber(*value.asInt());
+        case Value::Type::UInt: return writeNumber(*value.asUInt());
+        case Value::Type::Double: return writeReal(*value.asDouble());
+        case Value::Type::String: return writeString(*value.asString());
+        case Value::Type::Bytes: return writeBase64(value.asBytes()->view());
+        case Value::Type::Date: return writeReal(secondsSince1970(*value.asDate()));
+        case Value::Type::Array: return writeArray(*value.asArray());
+        case Value::Type::Dictionary: return writeDictionary(*value.asDictionary());
+        }
+    }
+
+private:
+    template <class Number, class... Format> void writeNumber(Number number, Format... format)
+    {
+        std::array<char, 32> digits;
+        const auto result = std::to_chars(digits.begin(), digits.end(), number, format...);
+        _sink.put(std::string_view(digits.begin(), result.ptr));
+    }
+
+    void writeReal(double number)
+    {
+        // Without an exponent these would be read as integers that are out of range, and "-0" as a plain zero.
+        constexpr double kIntegerLimit = 9223372036854775808.0;
+        if (!std::isfinite(number))
+            _sink.put("null");
+        else if (std::abs(number) >= kIntegerLimit)
+            writeNumber(number, std::chars_format::scientific);
+        else if (number == 0 && std::signbit(number))
+            _sink.put("-0.0");
+        else
+            writeNumber(number);
+    }
+
+    void writeString(std::string_view text)
+    {
+        if (simdjson::validate_utf8(text))
+            writeValidString(text);
+        else
+            writeValidString(repaired(text));
+    }
+
+    void writeValidString(std::string_view text)
+    {
+        _sink.put('"');
+        std::size_t begin = 0;
+        for (std::size_t i = 0; i < text.size(); ++i) {
+            const auto c = static_cast<unsigned char>(text[i]);
+            if (kEscapes[c] == Escape::None) continue;
+            _sink.put(text.substr(begin, i - begin));
+            begin = i + 1;
+            if (kEscapes[c] == Escape::Short) {
+                _sink.put('\\');
+                _sink.put(shortEscape(text[i]));
+            } else {
+                _sink.put(fmt::format("\\u{:04x}", c));
+            }
+        }
+        _sink.put(text.substr(begin));
+        _sink.put('"');
+    }
+
+    void writeBase64(std::string_view bytes)
+    {
+        constexpr std::size_t kChunk = 3 * 1024;
+        std::array<unsigned char, kChunk / 3 * 4 + 1> encoded;
+        _sink.put('"');
+        for (; !bytes.empty(); bytes.remove_prefix(std::min(kChunk, bytes.size()))) {
+            const int length = EVP_EncodeBlock(encoded.data(), reinterpret_cast<const unsigned char*>(bytes.data()),
+                                               static_cast<int>(std::min(kChunk, bytes.size())));
+            _sink.put(
+                std::string_view(reinterpret_cast<const char*>(encoded.data()), static_cast<std::size_t>(length)));
+        }
+        _sink.put('"');
+    }
+
+    void writeArray(const Value::Array& array)
+    {
+        writeContainer('[', ']', array, [this](const Value& element) { write(element); });
+    }
+
+    void writeDictionary(const Dictionary& dictionary)
+    {
+        writeContainer('{', '}', dictionary, [this](const Dictionary::Entry& entry) {
+            writeString(entry.first);
+            _sink.put(_pretty ? std::string_view(": ") : std::string_view(":"));
+            write(entry.second);
+        });
+    }
+
+    template <class Container, class WriteOne>
+    void writeContainer(char open, char close, const Container& container, WriteOne writeOne)
+    {
+        _sink.put(open);
+        ++_depth;
+        bool first = true;
+        for (const auto& item : container) {
+            if (!first) _sink.put(',');
+            first = false;
+            if (_pretty) newLine();
+            writeOne(item);
+        }
+        --_depth;
+        if (_pretty && !first) newLine();
+        _sink.put(close);
+    }
+
+    void newLine()
+    {
+        _sink.put('\n');
+        for (std::size_t i = 0; i < _depth; ++i) _sink.put("  ");
+    }
+
+    Sink& _sink;
+    const bool _pretty;
+    std::size_t _depth = 0;
+};
+
+} // namespace
+
+struct JsonDocument::Parsed {
+    std::unique_ptr<dom::parser> parser; ///< holds the document
+    dom::element root;
+
+    Parsed() : parser(keptParser ? std::move(keptParser) : std::make_unique<dom::parser>()) {}
+    ~Parsed()
+    {
+        if (parser->capacity() <= kKeptParserCapacity) keptParser = std::move(parser);
+    }
+    Parsed(const Parsed&) = delete;
+    Parsed& operator=(const Parsed&) = delete;
+
+    /// None where the document is no array.
+    [[nodiscard]] std::optional<dom::array> elements() const
+    {
+        dom::array array;
+        return root.get(array) == simdjson::SUCCESS ? std::optional(array) : std::nullopt;
+    }
+
+    /// The entry of the document's dictionary, if it is a T.
+    template <class T> [[nodiscard]] std::optional<T> entry(std::string_view wanted) const
+    {
+        std::optional<dom::element> last;
+        if (dom::object object; root.get(object) == simdjson::SUCCESS)
+            for (const auto& [key, element] : object)
+                if (key == wanted) last = element;
+        T value;
+        return last && last->get(value) == simdjson::SUCCESS ? std::optional(value) : std::nullopt;
+    }
+};
+
+JsonDocument::JsonDocument(std::unique_ptr<Parsed> parsed) : _parsed(std::move(parsed)) {}
+JsonDocument::JsonDocument(JsonDocument&&) noexcept = default;
+JsonDocument& JsonDocument::operator=(JsonDocument&&) noexcept = default;
+JsonDocument::~JsonDocument() = default;
+
+std::expected<JsonDocument, Error> JsonDocument::parse(std::string_view text, std::size_t maximumSize)
+{
+    if (text.size() > maximumSize) return malformed(fmt::format("larger than {} bytes", maximumSize));
+    if (text.starts_with("\xef\xbb\xbf")) text.remove_prefix(3);
+
+    auto parsed = std::make_unique<Parsed>();
+    const auto error = parseBounded(*parsed->parser, text, parsed->root);
+    if (error == simdjson::DEPTH_ERROR) return malformed(fmt::format("nested deeper than {}", kMaximumDepth));
+    if (error) return malformed(simdjson::error_message(error));
+    return JsonDocument(std::move(parsed));
+}
+
+Value JsonDocument::value() const
+{
+    return convert(_parsed->root);
+}
+
+std::size_t JsonDocument::count() const
+{
+    const auto elements = _parsed->elements();
+    return elements ? elements->size() : 0;
+}
+
+bool JsonDocument::anyElementHas(std::string_view key) const
+{
+    const auto elements = _parsed->elements();
+    return elements && std::ranges::any_of(*elements, [key](dom::element element) {
+               dom::object object;
+               return element.get(object) == simdjson::SUCCESS && !object.at_key(key).error();
+           });
+}
+
+std::optional<std::string_view> JsonDocument::textOf(std::string_view key) const
+{
+    return _parsed->entry<std::string_view>(key);
+}
+
+bool JsonDocument::hasDictionary(std::string_view key) const
+{
+    return _parsed->entry<dom::object>(key).has_value();
+}
+
+void JsonDocument::eachEntryOf(std::string_view key, const std::function<bool(std::string_view)>& wanted,
+                               const std::function<void(std::string_view, Value)>& take) const
+{
+    const auto dictionary = _parsed->entry<dom::object>(key);
+    if (!dictionary) return;
+    for (const auto& [name, element] : *dictionary)
+        if (wanted(name)) take(name, convert(element));
+}
+
+Value JsonDocument::entryOfFirst(std::string_view key) const
+{
+    const auto elements = _parsed->elements();
+    dom::object object;
+    if (!elements || elements->at(0).get(object) != simdjson::SUCCESS) return {};
+    std::optional<dom::element> last; // of duplicate keys
+    for (const auto& [name, element] : object)
+        if (name == key) last = element;
+    return last ? convert(*last) : Value();
+}
+
+std::expected<Value, Error> parseJson(std::string_view text, std::size_t maximumSize)
+{
+    auto document = JsonDocument::parse(text, maximumSize);
+    if (!document) return std::unexpected(std::move(document.error()));
+    return document->value();
+}
+
+std::string toJson(const Value& value, JsonStyle style)
+{
+    TextSink sink;
+    JsonWriter(sink, style).write(value);
+    return std::move(sink.text);
+}
+
+std::size_t jsonSize(const Value& value)
+{
+    CountingSink sink;
+    JsonWriter(sink, JsonStyle::Compact).write(value);
+    return sink.count;
+}
+
+} // namespace platform

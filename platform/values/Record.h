@@ -1,0 +1,362 @@
+#pragma once
+
+#include <concepts>
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <span>
+#include <string>
+#include <string_view>
+#include <tuple>
+#include <type_traits>
+#include <unordered_map>
+#include <utility>
+#include <vector>
+
+#include "platform/base/Uuid.h"
+#include "platform/values/Error.h"
+#include "platform/values/Value.h"
+
+/// Records: plain structs that list their fields once. Archives, IPC messages and tests all work from that list.
+///
+///     struct Suggestion : platform::RecordOf<Suggestion> {
+///         static constexpr std::string_view kClass = "Suggestion";
+///         std::optional<std::string> identifier;
+///         double score = 0;
+///         static constexpr auto fields()
+///         {
+///             return std::tuple{platform::field("id", &Suggestion::identifier),
+///                               platform::field("score", &Suggestion::score)};
+///         }
+///     };
+///
+/// A field is a bool, a whole number, an enumeration, a floating-point number, std::string, Uuid, Url, Bytes, Date,
+/// Value, Error, a shared_ptr to a record, or an optional or vector of these.
+///
+/// Decoding is class-checked: a value of the wrong type, an unknown class or a record of another class than the
+/// field's is an error that names the field, and so is a null in an array of records. Unknown keys are skipped; missing
+/// keys leave the field as it was made.
+namespace platform {
+
+/// Takes one record apart, value by value, in the order in which the record lists its fields.
+class Encoder {
+public:
+    virtual ~Encoder() = default;
+    virtual void beginRecord(std::string_view className, std::size_t fieldCount) = 0;
+    virtual void key(std::string_view name) = 0;
+    virtual void endRecord() = 0;
+    virtual void beginArray(std::size_t count) = 0;
+    virtual void endArray() = 0;
+    virtual void null() = 0;
+    virtual void boolean(bool value) = 0;
+    virtual void integer(std::int64_t value) = 0;
+    virtual void unsignedInteger(std::uint64_t value) = 0;
+    virtual void real(double value) = 0;
+    virtual void string(std::string_view value) = 0;
+    virtual void bytes(const Bytes& value) = 0;
+    virtual void date(Date value) = 0;
+    virtual void value(const Value& value) = 0;
+};
+
+class RecordClasses;
+
+/// Reads values back. Each read takes the value at hand and moves on; the first failure sticks, and from then on
+/// reads answer zero, so callers check once, at the end.
+class Decoder {
+public:
+    explicit Decoder(const RecordClasses& classes) : _classes(classes) {}
+    virtual ~Decoder() = default;
+
+    /// Takes a null if there is one at hand; false, and nothing taken, otherwise.
+    virtual bool null() = 0;
+    virtual bool boolean() = 0;
+    virtual std::int64_t integer() = 0;
+    virtual std::uint64_t unsignedInteger() = 0;
+    virtual double real() = 0;
+    virtual std::string string() = 0;
+    virtual Bytes bytes() = 0;
+    virtual Date date() = 0;
+    virtual Value value() = 0;
+    virtual void skip() = 0;
+    /// Whether there is a record at hand; nothing is taken. A dictionary that names no class is none.
+    virtual bool isRecord() = 0;
+    /// Enters a record and answers its class name, which lives as long as what is decoded. `nextKey` then moves from
+    /// key to key, and leaves at the end.
+    virtual std::string_view beginRecord() = 0;
+    /// False at the end of the record, which is then left. The view lives as long as what is decoded.
+    virtual bool nextKey(std::string_view& name) = 0;
+    /// Enters an array and answers a bound on its elements that is safe to reserve.
+    virtual std::size_t beginArray() = 0;
+    /// False at the end of the array, which is then left.
+    virtual bool nextElement() = 0;
+
+    /// Stops decoding. The first failure counts.
+    void fail(std::string reason, std::int64_t code = kMalformed);
+    [[nodiscard]] bool failed() const { return _failure.has_value(); }
+    /// Whoever reads a field, or an element of an array, says after a failure where it happened, the innermost first.
+    void failedIn(std::string_view field);
+    void failedIn(std::size_t index);
+    /// The failure: "FIELD: REASON", with the whole way to the field: "results[2].score: expected a double, …".
+    [[nodiscard]] std::optional<Error> error() const;
+    [[nodiscard]] const RecordClasses& classes() const { return _classes; }
+
+    /// Codes of the errors made here, in kFormatErrorDomain.
+    static constexpr std::int64_t kMalformed = kFormatMalformed;
+    static constexpr std::int64_t kUnknownClass = kFormatUnknownClass;
+
+protected:
+    /// Fails because `expected` ("an integer") was to be read where there is a value of type `found`.
+    void failExpecting(std::string_view expected, Value::Type found);
+
+private:
+    struct Failure {
+        std::string place; ///< of the value that could not be read, as far as it is known
+        std::string reason;
+        std::int64_t code;
+    };
+    const RecordClasses& _classes;
+    std::optional<Failure> _failure;
+};
+
+/// Base of every record.
+class Record {
+public:
+    virtual ~Record() = default;
+    [[nodiscard]] virtual std::string_view className() const = 0;
+    [[nodiscard]] virtual std::size_t fieldCount() const { return 0; }
+    virtual void encodeFields(Encoder&) const {}
+    /// Reads the value of `key`; false if the record has no such field, and nothing is taken. `next` is where the field
+    /// is looked for first, by its place in the record's list; it moves on behind the field that was found. Whoever
+    /// wrote the record did so in that order.
+    virtual bool decodeField(std::string_view key, Decoder& decoder, std::size_t& next);
+
+protected:
+    /// How a field is read into a record of the class that lists it.
+    struct FieldReader {
+        std::string_view name;
+        void (*read)(Record&, Decoder&);
+    };
+    /// All fields in the order of the list, those of the base first.
+    [[nodiscard]] virtual std::span<const FieldReader> fieldReaders() const { return {}; }
+};
+
+template <class Owner, class Member> struct Field {
+    std::string_view name;
+    Member Owner::* member;
+};
+template <class Owner, class Member> constexpr Field<Owner, Member> field(std::string_view name, Member Owner::* member)
+{
+    return {name, member};
+}
+
+/// The record classes that a reader accepts, by name, in no order.
+class RecordClasses {
+public:
+    using Factory = std::shared_ptr<Record> (*)();
+    template <class T> void add()
+    {
+        _factories[T::kClass] = []() -> std::shared_ptr<Record> { return std::make_shared<T>(); };
+    }
+    template <class... T> [[nodiscard]] static RecordClasses of()
+    {
+        RecordClasses classes;
+        (classes.add<T>(), ...);
+        return classes;
+    }
+    void addAll(const RecordClasses& other) { _factories.insert(other._factories.begin(), other._factories.end()); }
+    /// Null for an unknown name.
+    [[nodiscard]] std::shared_ptr<Record> make(std::string_view className) const
+    {
+        auto found = _factories.find(className);
+        return found == _factories.end() ? nullptr : found->second();
+    }
+    [[nodiscard]] auto begin() const { return _factories.begin(); }
+    [[nodiscard]] auto end() const { return _factories.end(); }
+
+private:
+    std::unordered_map<std::string_view, Factory> _factories;
+};
+
+void encodeRecord(Encoder& encoder, const Record& record);
+
+/// Reads a record of any known class; null after a failure.
+[[nodiscard]] std::shared_ptr<Record> decodeRecord(Decoder& decoder);
+/// Reads a record of a known class that is wanted (the record is fresh). Whatever else is at hand is skipped: null, and
+/// no failure.
+[[nodiscard]] std::shared_ptr<Record> decodeRecordIf(Decoder& decoder, bool (*wanted)(const Record&));
+/// The same for a record that is a `T`.
+template <class T> [[nodiscard]] std::shared_ptr<T> decodeRecordIfA(Decoder& decoder)
+{
+    const auto isA = [](const Record& record) { return dynamic_cast<const T*>(&record) != nullptr; };
+    return std::dynamic_pointer_cast<T>(decodeRecordIf(decoder, isA));
+}
+/// Reads the record at hand into `record`, which must be of the class found there.
+void decodeRecordInto(Decoder& decoder, Record& record);
+
+namespace detail {
+
+template <class T> struct IsOptional : std::false_type {};
+template <class T> struct IsOptional<std::optional<T>> : std::true_type {};
+template <class T> struct IsVector : std::false_type {};
+template <class T> struct IsVector<std::vector<T>> : std::true_type {};
+template <class T> struct IsShared : std::false_type {};
+template <class T> struct IsShared<std::shared_ptr<T>> : std::true_type {};
+
+void encodeError(Encoder& encoder, const Error& error);
+[[nodiscard]] Error decodeError(Decoder& decoder);
+
+template <class T> void encodeValue(Encoder& encoder, const T& value)
+{
+    if constexpr (std::is_same_v<T, bool>)
+        encoder.boolean(value);
+    else if constexpr (std::is_enum_v<T>)
+        encodeValue(encoder, static_cast<std::underlying_type_t<T>>(value));
+    else if constexpr (std::is_integral_v<T> && std::is_signed_v<T>)
+        encoder.integer(value);
+    else if constexpr (std::is_integral_v<T>)
+        encoder.unsignedInteger(value);
+    else if constexpr (std::is_floating_point_v<T>)
+        encoder.real(value);
+    else if constexpr (std::is_same_v<T, std::string>)
+        encoder.string(value);
+    else if constexpr (std::is_same_v<T, Bytes>)
+        encoder.bytes(value);
+    else if constexpr (std::is_same_v<T, Date>)
+        encoder.date(value);
+    else if constexpr (std::is_same_v<T, Value>)
+        encoder.value(value);
+    else if constexpr (std::is_same_v<T, Error>)
+        encodeError(encoder, value);
+    else if constexpr (std::is_same_v<T, Uuid>)
+        value.isNil() ? encoder.null() : encoder.string(value.string());
+    else if constexpr (IsOptional<T>::value)
+        value ? encodeValue(encoder, *value) : encoder.null();
+    else if constexpr (IsShared<T>::value)
+        value ? encodeRecord(encoder, *value) : encoder.null();
+    else if constexpr (IsVector<T>::value) {
+        encoder.beginArray(value.size());
+        for (const auto& element : value) encodeValue(encoder, element);
+        encoder.endArray();
+    } else
+        encoder.string(value.string()); // Url
+}
+
+template <class T> void decodeValue(Decoder& decoder, T& value)
+{
+    if constexpr (IsOptional<T>::value) {
+        if (decoder.null()) return value.reset();
+        typename T::value_type inner{};
+        decodeValue(decoder, inner);
+        value = std::move(inner);
+    } else if constexpr (std::is_same_v<T, Value>)
+        value = decoder.value();
+    else if (decoder.null())
+        value = T{};
+    else if constexpr (std::is_same_v<T, bool>)
+        value = decoder.boolean();
+    else if constexpr (std::is_enum_v<T>) {
+        std::underlying_type_t<T> number{};
+        decodeValue(decoder, number);
+        value = static_cast<T>(number);
+    } else if constexpr (std::is_integral_v<T> && std::is_signed_v<T>) {
+        const std::int64_t number = decoder.integer();
+        value = static_cast<T>(number);
+        if (value != number) decoder.fail("number out of range");
+    } else if constexpr (std::is_integral_v<T>) {
+        const std::uint64_t number = decoder.unsignedInteger();
+        value = static_cast<T>(number);
+        if (value != number) decoder.fail("number out of range");
+    } else if constexpr (std::is_floating_point_v<T>)
+        value = static_cast<T>(decoder.real());
+    else if constexpr (std::is_same_v<T, std::string>)
+        value = decoder.string();
+    else if constexpr (std::is_same_v<T, Bytes>)
+        value = decoder.bytes();
+    else if constexpr (std::is_same_v<T, Date>)
+        value = decoder.date();
+    else if constexpr (std::is_same_v<T, Error>)
+        value = decodeError(decoder);
+    else if constexpr (std::is_same_v<T, Uuid>) {
+        if (auto uuid = Uuid::parse(decoder.string()))
+            value = *uuid;
+        else
+            decoder.fail("not a UUID");
+    } else if constexpr (IsShared<T>::value) {
+        using R = typename T::element_type;
+        auto record = decodeRecord(decoder);
+        value = std::dynamic_pointer_cast<R>(record);
+        if (record && !value) decoder.fail("unexpected class " + std::string(record->className()));
+    } else if constexpr (IsVector<T>::value) {
+        value.clear();
+        value.reserve(decoder.beginArray());
+        while (decoder.nextElement()) {
+            decodeValue(decoder, value.emplace_back());
+            if constexpr (IsShared<typename T::value_type>::value) {
+                if (!value.back()) decoder.fail("missing record");
+            }
+            if (decoder.failed()) return decoder.failedIn(value.size() - 1);
+        }
+    } else { // Url
+        auto url = T::parse(decoder.string());
+        if (url)
+            value = std::move(*url);
+        else
+            decoder.fail("not a URL");
+    }
+}
+
+} // namespace detail
+
+/// Base of a record `Self` that extends the record `Base`; see the top of this file.
+template <class Self, class Base = Record> class RecordOf : public Base {
+public:
+    using Base::Base;
+
+    [[nodiscard]] std::string_view className() const override { return Self::kClass; }
+
+    [[nodiscard]] std::size_t fieldCount() const override
+    {
+        return Base::fieldCount() + std::tuple_size_v<decltype(Self::fields())>;
+    }
+
+    void encodeFields(Encoder& encoder) const override
+    {
+        Base::encodeFields(encoder);
+        const auto& self = static_cast<const Self&>(*this);
+        std::apply(
+            [&](const auto&... f) { ((encoder.key(f.name), detail::encodeValue(encoder, self.*(f.member))), ...); },
+            Self::fields());
+    }
+
+protected:
+    [[nodiscard]] std::span<const Record::FieldReader> fieldReaders() const override
+    {
+        static const std::vector<Record::FieldReader> readers = [this] {
+            const auto inherited = Base::fieldReaders();
+            std::vector<Record::FieldReader> all(inherited.begin(), inherited.end());
+            [&all]<std::size_t... I>(std::index_sequence<I...>) {
+                (all.push_back({std::get<I>(Self::fields()).name, readField<I>}), ...);
+            }(std::make_index_sequence<std::tuple_size_v<decltype(Self::fields())>>());
+            return all;
+        }();
+        return readers;
+    }
+
+private:
+    template <std::size_t I> static void readField(Record& record, Decoder& decoder)
+    {
+        constexpr auto member = std::get<I>(Self::fields()).member;
+        detail::decodeValue(decoder, static_cast<Self&>(record).*member);
+    }
+};
+
+/// What was decoded, as the record class that it must be.
+template <class T> [[nodiscard]] Result<std::shared_ptr<T>> castRecord(Result<std::shared_ptr<Record>> record)
+{
+    if (!record) return std::unexpected(std::move(record.error()));
+    if (auto cast = std::dynamic_pointer_cast<T>(*record)) return cast;
+    return std::unexpected(Error::withReason(std::string(kFormatErrorDomain), Decoder::kUnknownClass,
+                                             "unexpected class " + std::string((*record)->className())));
+}
+
+} // namespace platform

@@ -1,0 +1,121 @@
+#pragma once
+
+#include <cstdint>
+#include <expected>
+#include <initializer_list>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <type_traits>
+#include <utility>
+#include <variant>
+#include <vector>
+
+#include "platform/base/Bytes.h"
+#include "platform/base/Date.h"
+
+namespace platform {
+
+struct Error;
+class Dictionary;
+
+/// One value of a JSON document, a property list or an IPC message.
+///
+/// Copies are cheap: strings, arrays and dictionaries are shared and copied when one holder changes its own
+/// (`mutableArray()`, `mutableDictionary()`). A value handed to another thread is safe to read there; one
+/// object must not be written by two threads, as with any other type.
+///
+/// Reading never fails: an accessor that doesn't fit answers "nothing", and `operator[]` on what isn't there
+/// answers the null value, so `bag["a"]["b"].asString()` needs no checks in between.
+class Value {
+public:
+    enum class Type : std::uint8_t { Null, Bool, Int, UInt, Double, String, Bytes, Date, Array, Dictionary };
+    using Array = std::vector<Value>;
+
+    Value() = default;
+    Value(std::nullptr_t) {}
+    Value(bool b) : _storage(b) {}
+    /// Any other integer. Unsigned ones that fit are kept as signed, so equal numbers compare equal.
+    template <class I>
+        requires(std::is_integral_v<I> && !std::is_same_v<I, bool>)
+    Value(I i)
+    {
+        if (std::is_signed_v<I> || static_cast<std::uint64_t>(i) <= static_cast<std::uint64_t>(INT64_MAX))
+            _storage = static_cast<std::int64_t>(i);
+        else
+            _storage = static_cast<std::uint64_t>(i);
+    }
+    Value(double d) : _storage(d) {}
+    Value(std::string s);
+    Value(std::string_view s) : Value(std::string(s)) {}
+    Value(const char* s) : Value(std::string(s)) {}
+    Value(platform::Bytes bytes);
+    Value(platform::Date date) : _storage(date) {}
+    Value(Array array);
+    Value(Dictionary dictionary);
+    Value(const Value&) = default;
+    Value(Value&& other) noexcept : _storage(std::exchange(other._storage, std::monostate{})) {}
+    Value& operator=(const Value& other);
+    Value& operator=(Value&& other) noexcept;
+    ~Value();
+
+    /// A dictionary of the pairs given, in their order.
+    static Value dictionaryOf(std::initializer_list<std::pair<std::string, Value>> entries);
+
+    [[nodiscard]] Type type() const { return static_cast<Type>(_storage.index()); }
+    [[nodiscard]] bool isNull() const { return type() == Type::Null; }
+    [[nodiscard]] bool isNumber() const;
+
+    [[nodiscard]] std::optional<bool> asBool() const;
+    /// Integers that fit, and doubles that are whole and fit.
+    [[nodiscard]] std::optional<std::int64_t> asInt() const;
+    [[nodiscard]] std::optional<std::uint64_t> asUInt() const;
+    /// Any number.
+    [[nodiscard]] std::optional<double> asDouble() const;
+    /// The string, or null for another type. Lives as long as this value is unchanged.
+    [[nodiscard]] const std::string* asString() const;
+    [[nodiscard]] const platform::Bytes* asBytes() const;
+    [[nodiscard]] std::optional<platform::Date> asDate() const;
+    [[nodiscard]] const Array* asArray() const;
+    [[nodiscard]] const Dictionary* asDictionary() const;
+
+    /// The entry of a dictionary; the null value where there is none.
+    [[nodiscard]] const Value& operator[](std::string_view key) const;
+    /// Without this, a literal would be taken for an index.
+    [[nodiscard]] const Value& operator[](const char* key) const { return (*this)[std::string_view(key)]; }
+    /// The element of an array; the null value where there is none.
+    template <class I>
+        requires std::is_integral_v<I>
+    [[nodiscard]] const Value& operator[](I index) const
+    {
+        return element(static_cast<std::size_t>(index));
+    }
+    /// Elements of an array or entries of a dictionary; 0 for anything else.
+    [[nodiscard]] std::size_t count() const;
+
+    /// This value's own array to change; anything else becomes an empty array first.
+    [[nodiscard]] Array& mutableArray();
+    /// This value's own dictionary to change; anything else becomes an empty dictionary first.
+    [[nodiscard]] Dictionary& mutableDictionary();
+
+    /// Equal type and contents; integers compare by number whatever their signedness; dictionaries compare
+    /// without regard to order.
+    friend bool operator==(const Value& a, const Value& b);
+
+private:
+    [[nodiscard]] const Value& element(std::size_t index) const;
+
+    template <class T> using Shared = std::shared_ptr<T>;
+    std::variant<std::monostate, bool, std::int64_t, std::uint64_t, double, Shared<std::string>,
+                 Shared<platform::Bytes>, platform::Date, Shared<Array>, Shared<Dictionary>>
+        _storage;
+};
+
+/// "null", "bool", … for error texts.
+[[nodiscard]] std::string_view typeName(Value::Type type);
+
+/// How deep arrays and dictionaries may nest in anything that is read from outside.
+constexpr std::size_t kMaximumDepth = 128;
+
+} // namespace platform
