@@ -256,7 +256,7 @@ TEST_F(SystemBusTest, GeoClueIsAskedAsExactlyAsIsAllowedAndAnewWhereThatChanges)
         EXPECT_EQ(geo.wanted, c.level);
         EXPECT_EQ(geo.stopped, started++) << "the one before";
     }
-    EXPECT_EQ(geo.desktopId, "com.quorvane.tavrind");
+    EXPECT_EQ(geo.desktopId, "com.example.service");
     geo.accuracy = 300;
     geo.fix(service);
     EXPECT_TRUE(becomes(std::nullopt));
