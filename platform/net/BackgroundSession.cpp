@@ -12,6 +12,7 @@
 #include <fmt/format.h>
 
 #include "platform/base/Log.h"
+#include "platform/net/BackgroundAgenda.h"
 #include "platform/net/BackgroundPolicy.h"
 #include "platform/net/BackgroundStore.h"
 #include "platform/net/NetworkStatus.h"
@@ -136,7 +137,7 @@ public:
                                                  .maximumResponseSize = _configuration.maximumResponseSize,
                                                  .caFile = _configuration.caFile},
                                                 _queue)),
-          _time(environment.clock)
+          _time(environment.clock), _agenda(_configuration.parallelTransfers)
     {}
     ~Session() override
     {
@@ -203,7 +204,6 @@ private:
         std::shared_ptr<Task> kept; ///< from resume on
         std::shared_ptr<UrlTask> attempt;
         std::uint64_t attemptNumber = 0;
-        Duration due{}; ///< its place in the agenda
     };
 
     /// Runs `work` on the queue, if the session is still there then.
@@ -240,11 +240,9 @@ private:
     {
         return _network && _network->online && (!_network->metered || _configuration.allowsMetered);
     }
-    [[nodiscard]] Duration _holdOf(const UrlRequest& request, Duration now);
     void _hold(const UrlRequest& request, const UrlResponse& response);
 
-    void _unschedule(Entry& entry);
-    void _schedule(Entry& entry);
+    void _schedule(const Entry& entry);
     void _pump();
     void _setTimer(Duration now);
     void _begin(Entry& entry);
@@ -270,13 +268,7 @@ private:
     std::map<std::uint64_t, Entry> _entries;
     std::vector<std::uint64_t> _leftOver; ///< are over, and could not be removed from the store yet
     std::uint64_t _bodyBytes = 0;
-    std::map<std::string, Duration> _holds;
-
-    // A resumed task is in the agenda, at the moment when something is to be done about it: its deadline, or the end of
-    // a wait. One that could begin now is startable beside that.
-    std::set<std::pair<Duration, std::uint64_t>> _agenda;
-    std::set<std::uint64_t> _startable;
-    unsigned _running = 0;
+    BackgroundAgenda _agenda; // of the resumed tasks that have not ended
     std::uint64_t _lastAttempt = 0;
     Clock::TimerId _timer = 0;
     std::optional<Duration> _timerDue;
@@ -336,8 +328,7 @@ void Session::_takeUp(BackgroundStore::Contents contents)
     _time = LivedTime(_environment.clock, contents.time);
     const Duration now = _time.now();
     // A time beyond what can have been written would stick.
-    for (const auto& [host, until] : contents.holds)
-        if (until > now) _holds[host] = std::min(until, now + kLongestHold);
+    for (const auto& [host, until] : contents.holds) _agenda.hold(host, std::min(until, now + kLongestHold));
     for (StoredTask& stored : contents.tasks) {
         if (!stored.resumed && !stored.outcome) {
             (void)_store->forget(stored.identifier);
@@ -458,16 +449,6 @@ void Session::_networkChanged()
     _pump();
 }
 
-Duration Session::_holdOf(const UrlRequest& request, Duration now)
-{
-    if (_holds.empty()) return Duration::zero();
-    const auto found = _holds.find(request.url.host());
-    if (found == _holds.end()) return Duration::zero();
-    if (found->second > now) return found->second;
-    _holds.erase(found);
-    return Duration::zero();
-}
-
 void Session::_hold(const UrlRequest& request, const UrlResponse& response)
 {
     const std::string* field = response.headers.find("Retry-After");
@@ -477,7 +458,7 @@ void Session::_hold(const UrlRequest& request, const UrlResponse& response)
     const Duration until = _time.now() + *wait;
     // The service behind a redirect is asked through both.
     for (const std::string& host : std::set<std::string>{request.url.host(), response.url.host()}) {
-        _holds[host] = until;
+        _agenda.hold(host, until);
         if (auto saved = _store->saveHold(host, until, _time.mark()); !saved)
             defaultLog().error("the wait that {} asks for can't be saved: {}", host, saved.error().description());
     }
@@ -485,47 +466,34 @@ void Session::_hold(const UrlRequest& request, const UrlResponse& response)
 
 // ---- transfers ----
 
-void Session::_unschedule(Entry& entry)
+void Session::_schedule(const Entry& entry)
 {
-    _agenda.erase({entry.due, entry.stored.identifier});
-    _startable.erase(entry.stored.identifier);
-}
-
-void Session::_schedule(Entry& entry)
-{
-    _unschedule(entry);
-    if (!entry.stored.resumed || entry.stored.outcome) return;
-    const Duration now = _time.now();
-    const Duration mayBegin = std::max(entry.stored.notBefore, _holdOf(*entry.stored.request, now));
-    const bool waits = !entry.attempt && mayBegin > now;
-    entry.due = waits ? std::min(mayBegin, entry.stored.deadline) : entry.stored.deadline;
-    _agenda.emplace(entry.due, entry.stored.identifier);
-    if (!waits && !entry.attempt) _startable.insert(entry.stored.identifier);
+    const StoredTask& task = entry.stored;
+    if (!task.resumed || task.outcome) return;
+    _agenda.put(task.identifier,
+                {.host = task.request->url.host(),
+                 .notBefore = task.notBefore,
+                 .deadline = task.deadline,
+                 .underWay = entry.attempt != nullptr},
+                _time.now());
 }
 
 void Session::_pump()
 {
     const Duration now = _time.now();
-    while (!_agenda.empty() && _agenda.begin()->first <= now) {
-        Entry& entry = _entries.at(_agenda.begin()->second);
-        if (entry.stored.deadline <= now)
-            _finish(entry, std::nullopt, refusal(kUrlTimedOut, "not done within the time that it may take"));
-        else
-            _schedule(entry);
-    }
-    while (_mayTransfer() && _running < _configuration.parallelTransfers && !_startable.empty()) {
-        Entry& entry = _entries.at(*_startable.begin());
-        if (_holdOf(*entry.stored.request, now) > now)
-            _schedule(entry);
-        else
-            _begin(entry);
+    for (const std::uint64_t task : _agenda.takeExpired(now))
+        _finish(_entries.at(task), std::nullopt, refusal(kUrlTimedOut, "not done within the time that it may take"));
+    while (_mayTransfer()) {
+        const auto task = _agenda.next(now);
+        if (!task) break;
+        _begin(_entries.at(*task));
     }
     _setTimer(now);
 }
 
 void Session::_setTimer(Duration now)
 {
-    const auto due = _agenda.empty() ? std::nullopt : std::optional(_agenda.begin()->first);
+    const auto due = _agenda.nextDue();
     if (due == _timerDue) return;
     _environment.clock.cancel(std::exchange(_timer, 0));
     _timerDue = due;
@@ -563,7 +531,6 @@ void Session::_begin(Entry& entry)
             const std::optional<Bytes>&, std::optional<UrlResponse> response, std::optional<Error> error) {
             if (auto self = weak.lock()) self->_ended(identifier, attempt, std::move(response), std::move(error));
         });
-    ++_running;
     _schedule(entry);
     entry.attempt->resume();
 }
@@ -575,7 +542,6 @@ void Session::_ended(std::uint64_t identifier, std::uint64_t attempt, std::optio
     if (!entry || !entry->attempt || entry->attemptNumber != attempt) return; // stopped meanwhile
     entry->kept->setTiming(entry->attempt->timingData());
     entry->attempt.reset();
-    --_running;
     if (!error && response) {
         _hold(*entry->stored.request, *response);
         if (!entry->stored.isUpload)
@@ -602,15 +568,13 @@ void Session::_retry(Entry& entry, const Error& error)
 
 void Session::_stopAttempt(Entry& entry)
 {
-    if (!entry.attempt) return;
-    std::exchange(entry.attempt, nullptr)->cancel();
-    --_running;
+    if (entry.attempt) std::exchange(entry.attempt, nullptr)->cancel();
 }
 
 void Session::_finish(Entry& entry, std::optional<UrlResponse> response, std::optional<Error> error)
 {
     _stopAttempt(entry);
-    _unschedule(entry);
+    _agenda.remove(entry.stored.identifier);
     entry.stored.outcome = {std::move(response), std::move(error)};
     _save(entry);
     _report(entry);
