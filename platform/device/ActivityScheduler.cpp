@@ -125,30 +125,34 @@ public:
     void remove(const std::string& identifier);
 
 private:
+    /// A registration. `_entries` alone owns it: a callback that finds its entry gone, by `remove` or by another
+    /// registration of the name, does nothing.
     struct Entry {
+        const std::string identifier;
         ActivityCriteria criteria;
-        std::shared_ptr<const ActivityScheduler::Handler> handler;
-        std::uint64_t generation = 0; ///< of the registration
-        Duration registered{};
+        const std::shared_ptr<const ActivityScheduler::Handler> handler;
+        const Duration registered;
         enum class Stage { CheckingIn, Waiting, Asking, Running } stage = Stage::CheckingIn;
         Duration next{};        ///< when it is looked at, while it waits
         Duration gracePeriod{}; ///< how much later that may be
     };
+    using WeakEntry = std::weak_ptr<Entry>;
 
-    /// The entry, unless it was registered anew since.
-    Entry* _find(const std::string& identifier, std::uint64_t generation)
-    {
-        const auto found = _entries.find(identifier);
-        return found != _entries.end() && found->second.generation == generation ? &found->second : nullptr;
-    }
-    void _checkedIn(const std::string& identifier, std::uint64_t generation, const ActivityCriteria& criteria);
+    void _checkedIn(Entry& entry, const ActivityCriteria& criteria);
     void _wait(Entry& entry, Duration until, Duration gracePeriod);
     void _setTimer();
     void _lookAtDue();
-    void _lookAt(const std::string& identifier, Entry& entry);
-    void _decide(const std::string& identifier, std::uint64_t generation, const DeviceUse& use);
-    void _run(const std::string& identifier, Entry& entry);
-    void _ended(const std::string& identifier, std::uint64_t generation, ActivityState how);
+    void _lookAt(const std::shared_ptr<Entry>& entry);
+    void _decide(const std::shared_ptr<Entry>& entry, const DeviceUse& use);
+    void _run(const std::shared_ptr<Entry>& entry);
+    void _ended(Entry& entry, ActivityState how);
+    /// Runs `work` with the entry on the queue, if both are still there then.
+    template <class Work> void onQueue(WeakEntry entry, Work work)
+    {
+        onQueue([entry = std::move(entry), work = std::move(work)](Core& core) mutable {
+            if (const auto held = entry.lock()) work(core, held);
+        });
+    }
     void _load();
     void _save();
 
@@ -160,8 +164,7 @@ private:
     bool _loaded = false;
     LivedTime _time;
     std::map<std::string, Duration> _kept; ///< due times on disk
-    std::map<std::string, Entry> _entries;
-    std::uint64_t _lastGeneration = 0;
+    std::map<std::string, std::shared_ptr<Entry>> _entries;
     Clock::TimerId _timer = 0;
     std::optional<Duration> _timerDue;
 };
@@ -169,18 +172,18 @@ private:
 void Core::add(const std::string& identifier, const ActivityCriteria& criteria, ActivityScheduler::Handler handler)
 {
     _load();
-    Entry& entry =
-        _entries[identifier] = {.criteria = sane(criteria),
-                                .handler = std::make_shared<const ActivityScheduler::Handler>(std::move(handler)),
-                                .generation = ++_lastGeneration,
-                                .registered = _time.now()};
+    const auto entry =
+        std::make_shared<Entry>(identifier, sane(criteria),
+                                std::make_shared<const ActivityScheduler::Handler>(std::move(handler)), _time.now());
+    _entries[identifier] = entry;
     _setTimer();
     const auto call = std::make_shared<Call>(identifier, criteria, ActivityState::CheckIn, _environment.use, nullptr);
-    _handlers->async([weak = weak_from_this(), handler = entry.handler, generation = entry.generation, call] {
+    _handlers->async([weak = weak_from_this(), handler = entry->handler, registered = WeakEntry(entry), call] {
         (*handler)(call);
         if (auto self = weak.lock())
-            self->onQueue(
-                [call, generation](Core& core) { core._checkedIn(call->identifier(), generation, call->criteria()); });
+            self->onQueue(registered, [call](Core& core, const std::shared_ptr<Entry>& held) {
+                core._checkedIn(*held, call->criteria());
+            });
     });
 }
 
@@ -192,16 +195,12 @@ void Core::remove(const std::string& identifier)
     _setTimer();
 }
 
-void Core::_checkedIn(const std::string& identifier, std::uint64_t generation, const ActivityCriteria& criteria)
+void Core::_checkedIn(Entry& entry, const ActivityCriteria& criteria)
 {
-    Entry* entry = _find(identifier, generation);
-    if (!entry) return;
-    entry->criteria = sane(criteria);
-    const auto kept = _kept.find(identifier);
-    _wait(
-        *entry,
-        firstDue(entry->criteria, entry->registered, kept == _kept.end() ? std::nullopt : std::optional(kept->second)),
-        entry->criteria.gracePeriod);
+    entry.criteria = sane(criteria);
+    const auto kept = _kept.find(entry.identifier);
+    const auto due = kept == _kept.end() ? std::nullopt : std::optional(kept->second);
+    _wait(entry, firstDue(entry.criteria, entry.registered, due), entry.criteria.gracePeriod);
 }
 
 void Core::_wait(Entry& entry, Duration until, Duration gracePeriod)
@@ -216,7 +215,7 @@ void Core::_setTimer()
 {
     std::vector<ActivityWindow> windows;
     for (const auto& [identifier, entry] : _entries)
-        if (entry.stage == Entry::Stage::Waiting) windows.push_back({entry.next, entry.gracePeriod});
+        if (entry->stage == Entry::Stage::Waiting) windows.push_back({entry->next, entry->gracePeriod});
     const auto due = wakeTime(windows);
     if (due == _timerDue) return;
     _environment.clock.cancel(std::exchange(_timer, 0));
@@ -233,65 +232,61 @@ void Core::_lookAtDue()
 {
     _timerDue.reset();
     const Duration now = _time.now();
-    for (auto& [identifier, entry] : _entries)
-        if (entry.stage == Entry::Stage::Waiting && entry.next <= now) _lookAt(identifier, entry);
+    for (const auto& [identifier, entry] : _entries)
+        if (entry->stage == Entry::Stage::Waiting && entry->next <= now) _lookAt(entry);
     _setTimer();
 }
 
-void Core::_lookAt(const std::string& identifier, Entry& entry)
+void Core::_lookAt(const std::shared_ptr<Entry>& entry)
 {
-    if (!dependOnUse(entry.criteria)) return _run(identifier, entry);
-    entry.stage = Entry::Stage::Asking;
-    _environment.use.ask(
-        [weak = weak_from_this(), queue = _queue, identifier, generation = entry.generation](const DeviceUse& use) {
-            queue->async([weak, identifier, generation, use] {
-                if (auto self = weak.lock()) self->_decide(identifier, generation, use);
-            });
-        });
+    if (!dependOnUse(entry->criteria)) return _run(entry);
+    entry->stage = Entry::Stage::Asking;
+    _environment.use.ask([weak = weak_from_this(), asking = WeakEntry(entry)](const DeviceUse& use) {
+        if (const auto self = weak.lock())
+            self->onQueue(asking, [use](Core& core, const std::shared_ptr<Entry>& held) { core._decide(held, use); });
+    });
 }
 
-void Core::_decide(const std::string& identifier, std::uint64_t generation, const DeviceUse& use)
+void Core::_decide(const std::shared_ptr<Entry>& entry, const DeviceUse& use)
 {
-    Entry* entry = _find(identifier, generation);
-    if (!entry) return;
-    if (criteriaHold(entry->criteria, use)) return _run(identifier, *entry);
+    if (criteriaHold(entry->criteria, use)) return _run(entry);
     _wait(*entry, _time.now() + kSoon, entry->criteria.gracePeriod);
 }
 
-void Core::_run(const std::string& identifier, Entry& entry)
+void Core::_run(const std::shared_ptr<Entry>& entry)
 {
-    entry.stage = Entry::Stage::Running;
+    entry->stage = Entry::Stage::Running;
     // On disk first: a run that the process doesn't survive has been one.
-    if (entry.criteria.repeating)
-        _kept[identifier] = _time.now() + entry.criteria.interval;
+    if (entry->criteria.repeating)
+        _kept[entry->identifier] = _time.now() + entry->criteria.interval;
     else
-        _kept.erase(identifier);
+        _kept.erase(entry->identifier);
     _save();
     const auto call =
-        std::make_shared<Call>(identifier, entry.criteria, ActivityState::Run, _environment.use,
-                               [weak = weak_from_this(), identifier, generation = entry.generation](ActivityState how) {
-                                   if (auto self = weak.lock())
-                                       self->onQueue([=](Core& core) { core._ended(identifier, generation, how); });
+        std::make_shared<Call>(entry->identifier, entry->criteria, ActivityState::Run, _environment.use,
+                               [weak = weak_from_this(), running = WeakEntry(entry)](ActivityState how) {
+                                   if (const auto self = weak.lock())
+                                       self->onQueue(running, [how](Core& core, const std::shared_ptr<Entry>& held) {
+                                           core._ended(*held, how);
+                                       });
                                });
-    const auto& queue = entry.criteria.maintenance ? _maintenance : _handlers;
-    queue->async([handler = entry.handler, call] {
+    const auto& queue = entry->criteria.maintenance ? _maintenance : _handlers;
+    queue->async([handler = entry->handler, call] {
         (*handler)(call);
         if (call->state() == ActivityState::Run) (void)call->setState(ActivityState::Done);
     });
 }
 
-void Core::_ended(const std::string& identifier, std::uint64_t generation, ActivityState how)
+void Core::_ended(Entry& entry, ActivityState how)
 {
-    Entry* entry = _find(identifier, generation);
-    if (!entry) return;
     if (how == ActivityState::Defer) {
-        _kept[identifier] = _time.now() + kSoon;
+        _kept[entry.identifier] = _time.now() + kSoon;
         _save();
-        _wait(*entry, _kept[identifier], entry->criteria.gracePeriod);
-    } else if (entry->criteria.repeating) {
-        _wait(*entry, _kept[identifier], entry->criteria.gracePeriod);
+        _wait(entry, _kept[entry.identifier], entry.criteria.gracePeriod);
+    } else if (entry.criteria.repeating) {
+        _wait(entry, _kept[entry.identifier], entry.criteria.gracePeriod);
     } else {
-        _entries.erase(identifier);
+        _entries.erase(entry.identifier);
     }
 }
 
