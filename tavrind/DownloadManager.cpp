@@ -30,6 +30,8 @@ constexpr const char* kDirectory = "com.quorvane.tavrind";
 constexpr const char* kDelayKey = "TAVDownloadDelay"; // for development
 constexpr std::int64_t kDelay = 60;                   // seconds
 constexpr std::int64_t kLongestDelay = 24 * 60 * 60;
+/// How long a bag waits for the list of downloads that it replaces.
+constexpr std::chrono::seconds kLongestWait(60);
 
 const platform::Log& log()
 {
@@ -76,34 +78,32 @@ std::shared_ptr<DownloadManager> DownloadManager::make(Assembly& assembly)
 DownloadManager::DownloadManager(Assembly& assembly)
     : _assembly(assembly),
       _queue(assembly.device.serialQueue("com.quorvane.tavrin.DownloadManager", platform::Priority::Background))
-{}
+{
+    _loadResources(); // for readers that come before `_start`
+}
 
 DownloadManager::~DownloadManager() = default;
 
 void DownloadManager::setLookupResources(std::weak_ptr<LookupResources> lookupResources)
 {
-    _queue->sync([&] { _lookupResources = std::move(lookupResources); });
-}
-
-std::optional<DownloadResource> DownloadManager::resourceForKey(const std::string& identifier)
-{
-    _start();
-    return _queue->sync([&]() -> std::optional<DownloadResource> {
-        const auto found = _resources.find(identifier);
-        return found == _resources.end() ? std::nullopt : std::optional(found->second);
+    _queue->async([weak = weak_from_this(), lookupResources = std::move(lookupResources)] {
+        const auto self = weak.lock();
+        if (!self) return;
+        self->_lookupResources = lookupResources;
+        self->_publish();
     });
 }
 
-platform::Dictionary DownloadManager::resourceVersions()
+std::optional<DownloadResource> DownloadManager::resourceForKey(const std::string& identifier) const
 {
-    _start();
-    return _queue->sync([this] {
-        platform::Dictionary versions;
-        for (const auto& [identifier, resource] : _resources)
-            if (std::string version = _resourceVersion(resource); !version.empty())
-                versions.set(identifier, std::move(version));
-        return versions;
-    });
+    const std::shared_ptr<const Published> published = _published;
+    const auto found = published->resources.find(identifier);
+    return found == published->resources.end() ? std::nullopt : std::optional(found->second);
+}
+
+platform::Dictionary DownloadManager::resourceVersions() const
+{
+    return _published.load()->versions;
 }
 
 platform::Result<DownloadManager::Resource> DownloadManager::fileHandleForResource(const std::string& identifier) const
@@ -156,24 +156,43 @@ void DownloadManager::_start()
 void DownloadManager::_loadResources()
 {
     _resources = resourcesIn(_assembly.userDefaults.value(kTableKey));
+    _publish();
 }
 
 void DownloadManager::_saveResources()
 {
+    _publish();
     Value table = valueOf(_resources);
     if (_assembly.userDefaults.value(kTableKey) != table) _assembly.userDefaults.set(kTableKey, std::move(table));
+}
+
+void DownloadManager::_publish()
+{
+    platform::Dictionary versions;
+    for (const auto& [identifier, resource] : _resources)
+        if (std::string version = _resourceVersion(resource); !version.empty())
+            versions.set(identifier, std::move(version));
+    _published = std::make_shared<const Published>(_resources, std::move(versions));
 }
 
 void DownloadManager::_downloadBagResources(const std::shared_ptr<const TAVBag>& bag)
 {
     _queue->assertOnQueue();
-    _latestBag = bag;
-    // The queue goes on meanwhile: who waits in `sync` for a version holds a worker that the list may need.
-    _assembly.downloadURLSession->getTasks([weak = weak_from_this(), queue = _queue, bag](auto tasks) {
-        queue->async([weak, bag, tasks = std::move(tasks)] {
-            const auto self = weak.lock();
-            if (self && self->_latestBag == bag) self->_replaceDownloads(tasks, *bag);
-        });
+    struct List {
+        platform::Event arrived;
+        std::vector<std::shared_ptr<platform::BackgroundTask>> tasks;
+    };
+    const auto list = std::make_shared<List>();
+    _assembly.downloadURLSession->getTasks([list](auto tasks) {
+        list->tasks = std::move(tasks);
+        list->arrived.signal();
+    });
+    _queue->suspendUntil(list->arrived, kLongestWait, [weak = weak_from_this(), list, bag] {
+        const auto self = weak.lock();
+        if (!self) return;
+        const bool arrived = list->arrived.signalled();
+        if (!arrived) log().error("the list of downloads didn't arrive, none is cancelled");
+        self->_replaceDownloads(arrived ? std::move(list->tasks) : decltype(list->tasks)(), *bag);
     });
 }
 
@@ -203,24 +222,25 @@ void DownloadManager::_addResource(const std::string& identifier, const std::opt
         return;
     }
     if (const auto pending = _pending.find(identifier); pending != _pending.end()) {
-        *pending->second = *url;
+        pending->second.url = *url;
         return;
     }
-    const auto pending = std::make_shared<Url>(*url);
-    _pending.emplace(identifier, pending);
-    _queue->after(_delay(), [weak = weak_from_this(), identifier, awaited = std::weak_ptr(pending)] {
-        const auto self = weak.lock();
-        if (self && !awaited.expired()) self->_startPending(identifier);
+    const std::uint64_t timer = ++_lastTimer;
+    _pending.emplace(identifier, Pending{*url, timer});
+    _queue->after(_delay(), [weak = weak_from_this(), identifier, timer] {
+        if (const auto self = weak.lock()) self->_startPending(identifier, timer);
     });
 }
 
-void DownloadManager::_startPending(const std::string& identifier)
+void DownloadManager::_startPending(const std::string& identifier, std::uint64_t timer)
 {
-    const auto pending = _pending.extract(identifier);
+    const auto pending = _pending.find(identifier);
+    if (pending == _pending.end() || pending->second.timer != timer) return; // called off
+    const Url url = std::move(pending->second.url);
+    _pending.erase(pending);
     const auto found = _resources.find(identifier);
-    if (!pending || found == _resources.end()) return;
+    if (found == _resources.end()) return;
     if (!_isAllowed(identifier)) return log().log("{} is disabled, not downloading", identifier);
-    const Url& url = *pending.mapped();
     if (const auto reason = downloadReason(found->second, url, _fileExists(identifier)))
         _downloadResource(found->second, url, *reason);
 }
@@ -287,6 +307,7 @@ void DownloadManager::_deleteResource(const std::string& identifier, File file)
     log().info("deleting resource: {}", identifier);
     _resources.erase(identifier);
     _pending.erase(identifier);
+    _publish();
     if (file == File::Remove) _removeFile(identifier);
     _assembly.notificationCenter.post({.name = TAVFileDeletedNotification, .userInfo = {{"identifier", identifier}}});
 }

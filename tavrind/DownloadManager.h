@@ -1,5 +1,7 @@
 #pragma once
 
+#include <atomic>
+#include <cstdint>
 #include <filesystem>
 #include <map>
 #include <memory>
@@ -59,9 +61,10 @@ public:
     /// Until this is called, lookups are taken for enabled, and their hints for unversioned.
     void setLookupResources(std::weak_ptr<LookupResources> lookupResources);
 
-    [[nodiscard]] std::optional<DownloadResource> resourceForKey(const std::string& identifier);
-    /// Resource identifier to version, of those that have one.
-    [[nodiscard]] platform::Dictionary resourceVersions();
+    /// What the last change left; never waits for one that is under way.
+    [[nodiscard]] std::optional<DownloadResource> resourceForKey(const std::string& identifier) const;
+    /// Resource identifier to version, for resources that have a version. Never waits either: every new session asks.
+    [[nodiscard]] platform::Dictionary resourceVersions() const;
 
     struct Resource {
         platform::FileHandle file;
@@ -80,18 +83,29 @@ public:
 
 private:
     enum class File { Keep, Remove };
+    /// A download whose delay runs.
+    struct Pending {
+        platform::Url url;       ///< the latest; a later bag may replace it
+        std::uint64_t timer = 0; ///< a timer of another number was called off
+    };
+    /// What any thread may read: replaced whole, never changed.
+    struct Published {
+        DownloadResources resources;
+        platform::Dictionary versions;
+    };
 
     void bagChangeNotification(const std::shared_ptr<const TAVBag>& bag);
     void _handleSignificantLocationChange();
     void _start();
     void _loadResources();
     void _saveResources();
+    void _publish();
     void _downloadBagResources(const std::shared_ptr<const TAVBag>& bag);
     void _replaceDownloads(const std::vector<std::shared_ptr<platform::BackgroundTask>>& tasks, const TAVBag& bag);
     void _addResource(const std::string& identifier, const std::optional<platform::Url>& url);
     void _deleteResource(const std::string& identifier, File file);
     void _removeFile(const std::string& identifier) const;
-    void _startPending(const std::string& identifier);
+    void _startPending(const std::string& identifier, std::uint64_t timer);
     void _downloadResource(const DownloadResource& resource, const platform::Url& url, std::string_view reason);
     [[nodiscard]] platform::UrlRequest _createDownloadRequest(const DownloadResource& resource,
                                                               const platform::Url& url) const;
@@ -104,14 +118,13 @@ private:
                        const platform::UrlResponse& response);
 
     Assembly& _assembly;
-    const std::shared_ptr<platform::Queue> _queue; // guards all below but the flag and the observers
+    const std::shared_ptr<platform::Queue> _queue; // all below is confined to it, unless it says otherwise
     DownloadResources _resources;
-    /// Downloads whose delay runs, each with the URL that it will have by then. Its timer knows it by the pointer, so
-    /// that one that was called off doesn't begin the next.
-    std::map<std::string, std::shared_ptr<platform::Url>> _pending;
+    std::map<std::string, Pending> _pending; // by identifier
+    std::uint64_t _lastTimer = 0;
     std::weak_ptr<LookupResources> _lookupResources;
-    std::shared_ptr<const TAVBag> _latestBag; // whose downloads take the place of all others
-    std::once_flag _started;
+    std::atomic<std::shared_ptr<const Published>> _published; // any thread
+    std::once_flag _started;                                  // any thread
     platform::NotificationCenter::Token _bagObserver;
     platform::NotificationCenter::Token _locationObserver;
 };
