@@ -1,7 +1,6 @@
 #include "tavrind/DeepLinks.h"
 
 #include <algorithm>
-#include <random>
 
 #include "platform/net/Url.h"
 #include "platform/net/UrlScheme.h"
@@ -160,15 +159,11 @@ void DeepLinks::save(const std::string& key, std::string link, DeepLinkSubmissio
     submission[key].insert(std::move(link));
 }
 
-std::vector<std::string> DeepLinks::recordingOrder(const DeepLinkSubmission& submission, platform::Date date)
+std::vector<std::string> DeepLinks::recordingOrder(const DeepLinkSubmission& submission, std::mt19937_64& random)
 {
     std::vector<std::string> order;
     for (const auto& [identifier, links] : submission) order.push_back(identifier);
-    if (order.empty()) return order;
-    const auto halfDay = std::chrono::floor<std::chrono::hours>(date).time_since_epoch() / std::chrono::hours(12);
-    // By chance that is the same for everyone who asks: no rhythm of runs meets always the same application.
-    std::mt19937_64 chance(static_cast<std::uint64_t>(halfDay));
-    std::ranges::rotate(order, order.begin() + static_cast<std::ptrdiff_t>(chance() % order.size()));
+    std::ranges::shuffle(order, random);
     return order;
 }
 

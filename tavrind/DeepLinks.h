@@ -2,6 +2,7 @@
 
 #include <map>
 #include <optional>
+#include <random>
 #include <set>
 #include <string>
 #include <string_view>
@@ -53,10 +54,9 @@ struct DeepLinks {
                                                                         const List& blacklist, const List& whitelist);
     [[nodiscard]] static bool _isUniversalLink(const DeepLinkComponents& link);
     static void save(const std::string& key, std::string link, DeepLinkSubmission& submission);
-    /// The applications in the order in which a run at that time records them: by identifier, but beginning at another
-    /// one every half day, so that a run that ends early doesn't always leave out the same.
+    /// Returns the applications in a random order, so that a run that ends early doesn't always leave out the same.
     [[nodiscard]] static std::vector<std::string> recordingOrder(const DeepLinkSubmission& submission,
-                                                                 platform::Date date);
+                                                                 std::mt19937_64& random);
 };
 
 } // namespace tavrin

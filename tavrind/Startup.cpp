@@ -1,6 +1,7 @@
 #include "tavrind/Startup.h"
 
 #include <cstdlib>
+#include <random>
 
 #include "CoreTavrin/TAVProtocols.h"
 #include "platform/base/Log.h"
@@ -94,7 +95,7 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device)
     assembly.clientStateManager = ClientStateManager::make(assembly);
     assembly.appWhitelistController = AppWhitelistController::make(assembly);
     assembly.periodicTaskManager = std::make_shared<TavrinDPPeriodicTaskManager>(assembly);
-    daemon->deepLinkIngester = std::make_shared<TavrinDPAppDeepLinkIngester>(assembly);
+    daemon->deepLinkIngester = std::make_shared<TavrinDPAppDeepLinkIngester>(assembly, std::random_device()());
     daemon->deepLinkIngester->scheduleMaintenance();
     daemon->service = TavrinService::make(assembly);
 

@@ -94,7 +94,7 @@ void TavrinDPAppDeepLinkIngester::ingestStartingOn(platform::Date start, platfor
     const auto whitelist = _fetchCrowdsourcingWhitelist();
     const FilteredDeepLinks filtered = DeepLinks::_normalizeAndFilterDeepLinks(entries, blacklist, whitelist);
     _count(filtered);
-    _record(filtered.submission, end);
+    _record(filtered.submission);
 }
 
 DeepLinks::List TavrinDPAppDeepLinkIngester::_fetchCrowdsourcingWhitelist() const
@@ -118,20 +118,21 @@ void TavrinDPAppDeepLinkIngester::_count(const FilteredDeepLinks& filtered)
     counters.addValue(filtered.urls, "com.quorvane.tavrind.dp.normalizedlink.urls");
 }
 
-void TavrinDPAppDeepLinkIngester::_record(const DeepLinkSubmission& submission, platform::Date date)
+void TavrinDPAppDeepLinkIngester::_record(const DeepLinkSubmission& submission)
 {
     TavrinDiagnosticDataReporter& counters = _assembly.diagnosticData;
     const platform::Device& device = _assembly.device;
     platform::PrivacyRecorder recorder(device.files, device.clock, device.directories.state / kRecorderDirectory);
     std::int64_t sent = 0;
-    for (const std::string& identifier : DeepLinks::recordingOrder(submission, date)) {
+    for (const std::string& identifier : DeepLinks::recordingOrder(submission, _random)) {
         const std::set<std::string>& links = submission.at(identifier);
-        if (const auto recorded = recorder.record(fmt::format("{}.{}", appDeepLinkKey, identifier), links); !recorded) {
+        const auto recorded = recorder.record(fmt::format("{}.{}", appDeepLinkKey, identifier), links);
+        if (!recorded) {
             log().log("deep links are not recorded: {}", recorded.error().description());
             counters.addValue(1, "com.quorvane.tavrind.dp.record.app.failure");
             break;
         }
-        const auto count = static_cast<std::int64_t>(links.size());
+        const auto count = static_cast<std::int64_t>(*recorded); // less than all when the budget runs out
         counters.addValue(count, "com.quorvane.tavrind.dp.sentlinks.app");
         counters.addValue(1, "com.quorvane.tavrind.dp.record.app.success");
         sent += count;

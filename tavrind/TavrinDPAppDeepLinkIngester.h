@@ -1,6 +1,8 @@
 #pragma once
 
+#include <cstdint>
 #include <memory>
+#include <random>
 #include <string>
 #include <string_view>
 
@@ -22,7 +24,8 @@ public:
     /// The recorder's directory, in the user's state directory.
     static constexpr std::string_view kRecorderDirectory = "com.quorvane.tavrind/privacy";
 
-    explicit TavrinDPAppDeepLinkIngester(Assembly& assembly) : _assembly(assembly) {}
+    /// `seed` is chance's: it decides in which order applications are recorded.
+    TavrinDPAppDeepLinkIngester(Assembly& assembly, std::uint64_t seed) : _assembly(assembly), _random(seed) {}
 
     /// Registers the periodic task. Any thread.
     void scheduleMaintenance();
@@ -34,9 +37,10 @@ private:
     [[nodiscard]] DeepLinks::List _fetchCrowdsourcingWhitelist() const;
     [[nodiscard]] DeepLinks::List _fetchCrowdsourcingBlacklist() const;
     void _count(const FilteredDeepLinks& filtered);
-    void _record(const DeepLinkSubmission& submission, platform::Date date);
+    void _record(const DeepLinkSubmission& submission);
 
     Assembly& _assembly;
+    std::mt19937_64 _random; // of the run
 };
 
 } // namespace tavrin

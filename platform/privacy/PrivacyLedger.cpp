@@ -15,13 +15,12 @@ namespace platform {
 
 namespace {
 
-constexpr std::int64_t kDay = 24 * 60 * 60; // seconds
-constexpr std::int64_t kLatest = std::int64_t(1) << 40;
+constexpr std::int64_t kDay = 24 * 60 * 60;             // seconds
+constexpr std::int64_t kLatest = std::int64_t(1) << 40; // seconds
 
-std::int64_t timeOf(const std::vector<PrivacyLedger::Debit>& debits, Date now)
+std::int64_t secondsOf(Duration lived)
 {
-    const std::int64_t clock = std::chrono::floor<std::chrono::seconds>(now).time_since_epoch().count();
-    return debits.empty() ? clock : std::max(clock, debits.back().at);
+    return std::chrono::floor<std::chrono::seconds>(lived).count();
 }
 
 std::string digestOf(std::string_view text)
@@ -38,7 +37,7 @@ bool readDebits(const Value& value, std::vector<PrivacyLedger::Debit>& debits)
     for (const Value& entry : *value.asArray()) {
         const auto at = entry[0].asInt();
         const auto reports = entry[1].asInt();
-        const std::int64_t earliest = debits.empty() ? -kLatest : debits.back().at;
+        const std::int64_t earliest = debits.empty() ? 0 : debits.back().at;
         if (!at || *at < earliest || *at > kLatest || !reports || *reports < 1 ||
             *reports > PrivacyLedger::kReportsADay)
             return false;
@@ -47,29 +46,43 @@ bool readDebits(const Value& value, std::vector<PrivacyLedger::Debit>& debits)
     return true;
 }
 
+/// A ledger with debits has a time, which is not before the last of them.
+bool readTime(const Value& value, PrivacyLedger& ledger)
+{
+    const auto lived = value["lived"].asInt();
+    const auto wall = value["wall"].asInt();
+    if (lived && wall) ledger.time = {Duration(*lived), Date(Duration(*wall))};
+    return ledger.debits.empty() || (ledger.time && ledger.debits.back().at <= secondsOf(ledger.time->lived));
+}
+
 } // namespace
 
-int PrivacyLedger::left(Date now) const
+int PrivacyLedger::left(Duration lived) const
 {
-    const std::int64_t time = timeOf(debits, now);
+    const std::int64_t now = secondsOf(lived);
     int left = kReportsADay;
     for (const Debit& debit : debits)
-        if (debit.at > time - kDay) left -= debit.reports;
+        if (debit.at > now - kDay) left -= debit.reports;
     return std::max(left, 0);
 }
 
-void PrivacyLedger::debit(int reports, Date now)
+void PrivacyLedger::debit(int reports, Duration lived)
 {
-    const std::int64_t time = timeOf(debits, now);
-    std::erase_if(debits, [&](const Debit& debit) { return debit.at <= time - kDay; });
-    debits.push_back({time, reports});
+    const std::int64_t at = secondsOf(lived);
+    std::erase_if(debits, [&](const Debit& debit) { return debit.at <= at - kDay; });
+    debits.push_back({at, reports});
 }
 
 std::string PrivacyLedger::text() const
 {
     Value::Array booked;
     for (const Debit& debit : debits) booked.push_back(Value::Array{debit.at, debit.reports});
-    const std::string contents = toJson(Dictionary{{"secret", hexText(secret)}, {"debits", std::move(booked)}});
+    Dictionary ledger{{"secret", hexText(secret)}, {"debits", std::move(booked)}};
+    if (time) {
+        ledger.set("lived", time->lived.count());
+        ledger.set("wall", time->wall.time_since_epoch().count());
+    }
+    const std::string contents = toJson(ledger);
     return contents + "\n" + digestOf(contents) + "\n";
 }
 
@@ -80,7 +93,7 @@ Result<PrivacyLedger> PrivacyLedger::parse(std::string_view text)
     const auto value = parseJson(contents);
     const std::string* secret = value ? (*value)["secret"].asString() : nullptr;
     if (text.substr(contents.size()) != "\n" + digestOf(contents) + "\n" || !secret ||
-        !readHex(*secret, ledger.secret) || !readDebits((*value)["debits"], ledger.debits))
+        !readHex(*secret, ledger.secret) || !readDebits((*value)["debits"], ledger.debits) || !readTime(*value, ledger))
         return std::unexpected(
             Error::withReason(std::string(kFormatErrorDomain), kFormatMalformed, "the privacy ledger is damaged"));
     return ledger;

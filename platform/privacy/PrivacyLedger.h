@@ -1,12 +1,15 @@
 #pragma once
 
 #include <cstdint>
+#include <optional>
+#include <span>
 #include <string>
 #include <string_view>
 #include <vector>
 
 #include "platform/base/Date.h"
 #include "platform/privacy/RandomizedResponse.h"
+#include "platform/run/LivedTime.h"
 #include "platform/values/Error.h"
 
 namespace platform {
@@ -14,33 +17,35 @@ namespace platform {
 /// What a device has told of its user in the last day, and the secret that hides it: a value, as it is kept on disk
 /// (docs/formats.md).
 ///
-/// The ledger's time is the clock's, but never earlier than its last debit: a clock that was set back brings no new
-/// budget.
+/// The ledger counts lived time (`LivedTime`). So a clock that was set back brings no new budget, and a debit that was
+/// made while the clock ran years ahead doesn't use up the budget of those years.
 struct PrivacyLedger {
-    /// In any 24 hours of the ledger's time.
+    /// In any 24 hours of lived time.
     static constexpr int kReportsADay = 8;
 
     struct Debit {
-        std::int64_t at = 0; ///< seconds since 1970
+        std::int64_t at = 0; ///< seconds of lived time
         int reports = 0;
         friend bool operator==(const Debit&, const Debit&) = default;
     };
 
     DeviceSecret secret{};
-    std::vector<Debit> debits; ///< in order of time; those that no longer count may be missing
+    std::optional<LivedTime::Mark> time; ///< when it was last written; nothing before the first time
+    std::vector<Debit> debits;           ///< in order of time; those that no longer count may be missing
 
-    /// Reports that may still be made; 0 at least.
-    [[nodiscard]] int left(Date now) const;
-    /// Books reports, as many as are left at most.
-    void debit(int reports, Date now);
+    /// Returns how many reports may still be made; never less than 0.
+    [[nodiscard]] int left(Duration lived) const;
+    /// Books reports. The caller has asked `left` first.
+    void debit(int reports, Duration lived);
 
-    /// With a digest, so that damage shows.
+    /// The file's contents, with a digest that shows damage.
     [[nodiscard]] std::string text() const;
-    /// An error for anything that `text` didn't make.
+    /// Fails for anything that `text` didn't make.
     [[nodiscard]] static Result<PrivacyLedger> parse(std::string_view text);
 };
 
-/// Bytes as small hexadecimal digits, and back. False where the text isn't so many bytes, which are then undefined.
+/// Bytes as lower-case hexadecimal digits, and back. `readHex` returns false if the text isn't exactly that many bytes;
+/// `bytes` are undefined then.
 [[nodiscard]] std::string hexText(std::span<const std::uint8_t> bytes);
 [[nodiscard]] bool readHex(std::string_view text, std::span<std::uint8_t> bytes);
 

@@ -1,9 +1,9 @@
 #include "platform/privacy/PrivacyRecorder.h"
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
-#include <iterator>
-#include <limits>
+#include <span>
 
 #include <fmt/format.h>
 #include <openssl/rand.h>
@@ -11,6 +11,7 @@
 #include "platform/base/Log.h"
 #include "platform/files/Files.h"
 #include "platform/run/Clock.h"
+#include "platform/run/LivedTime.h"
 #include "platform/values/Dictionary.h"
 #include "platform/values/Json.h"
 #include "platform/values/Value.h"
@@ -26,29 +27,6 @@ std::unexpected<Error> failure(std::int64_t code, std::string reason)
 {
     return std::unexpected(Error::withReason(std::string(kPrivacyErrorDomain), code, std::move(reason)));
 }
-
-/// Random numbers for the standard library's choices.
-class Generator {
-public:
-    using result_type = std::uint64_t;
-    explicit Generator(const RandomBytes& random) : _random(random) {}
-    static constexpr result_type min() { return 0; }
-    static constexpr result_type max() { return std::numeric_limits<result_type>::max(); }
-    result_type operator()()
-    {
-        std::array<std::uint8_t, sizeof(result_type)> bytes{};
-        _failed |= !_random(bytes);
-        result_type number = 0;
-        for (const std::uint8_t byte : bytes) number = number << 8 | byte;
-        return _failed ? _drawn++ : number; // nobody uses what is chosen then, but choosing must end
-    }
-    [[nodiscard]] bool failed() const { return _failed; }
-
-private:
-    const RandomBytes& _random;
-    bool _failed = false;
-    result_type _drawn = 0;
-};
 
 /// "2026-01-31", UTC. Such texts compare as the days do.
 std::string dayOf(Date date)
@@ -75,51 +53,67 @@ PrivacyRecorder::PrivacyRecorder(FileSystem& files, Clock& clock, std::filesyste
     : _files(files), _clock(clock), _directory(std::move(directory)), _random(std::move(random))
 {}
 
-Result<void> PrivacyRecorder::record(std::string_view key, const std::set<std::string>& texts)
-{
-    if (texts.empty()) return {};
-    if (auto made = _files.createDirectories(_directory); !made) return made;
-    const auto lock = _files.lock(_directory / "lock");
-    if (!lock) return std::unexpected(lock.error());
-    auto ledger = readLedger();
-    if (!ledger) return std::unexpected(std::move(ledger.error()));
-    const Date now = _clock.wallNow();
-    const int left = ledger->left(now);
-    if (left == 0) return failure(kPrivacyBudgetExhausted, "the privacy budget of the day is used up");
+/// All the randomness of one call: nothing can run out of it halfway.
+struct PrivacyRecorder::Drawn {
+    DeviceSecret newSecret{};
+    std::array<PrivacyRandom, PrivacyLedger::kReportsADay> noise{};
+    std::vector<std::uint64_t> ranks; ///< one for each text; those of the lowest are recorded
+};
 
-    // Made before they are paid for, so that a failure to make them costs nothing.
-    const auto reports = privatise(ledger->secret, key, texts, left);
-    if (!reports) return std::unexpected(reports.error());
-    ledger->debit(static_cast<int>(reports->size()), now);
-    if (auto debited = _files.writeAtomically(_directory / "ledger", ledger->text()); !debited) return debited;
-    return addReports(*reports);
+Result<PrivacyRecorder::Drawn> PrivacyRecorder::draw(std::size_t texts) const
+{
+    const auto bytesOf = [](auto& value) {
+        return std::span(reinterpret_cast<std::uint8_t*>(value.data()), value.size() * sizeof(value[0]));
+    };
+    Drawn drawn;
+    drawn.ranks.resize(texts);
+    if (_random(bytesOf(drawn.newSecret)) && _random(bytesOf(drawn.noise)) && _random(bytesOf(drawn.ranks)))
+        return drawn;
+    return failure(kPrivacyNoRandomness, "no randomness for reports");
 }
 
-Result<PrivacyLedger> PrivacyRecorder::readLedger() const
+Result<std::size_t> PrivacyRecorder::record(std::string_view key, const std::set<std::string>& texts)
+{
+    if (texts.empty()) return 0;
+    const auto drawn = draw(texts.size());
+    if (!drawn) return std::unexpected(drawn.error());
+    if (auto made = _files.createDirectories(_directory); !made) return std::unexpected(std::move(made.error()));
+    const auto lock = _files.lock(_directory / "lock");
+    if (!lock) return std::unexpected(lock.error());
+    auto ledger = readLedger(drawn->newSecret);
+    if (!ledger) return std::unexpected(std::move(ledger.error()));
+    const LivedTime::Mark now = LivedTime(_clock, ledger->time).mark();
+    ledger->time = now; // written in any case, so that time goes on from a clock that was set back
+    const std::size_t count = std::min(texts.size(), static_cast<std::size_t>(ledger->left(now.lived)));
+    if (count == 0) {
+        if (auto written = writeLedger(*ledger); !written) return std::unexpected(std::move(written.error()));
+        return failure(kPrivacyBudgetExhausted, "the privacy budget of the day is used up");
+    }
+
+    std::vector<std::pair<std::uint64_t, std::string_view>> chosen;
+    for (const std::string& text : texts) chosen.emplace_back(drawn->ranks[chosen.size()], text);
+    std::ranges::partial_sort(chosen, chosen.begin() + static_cast<std::ptrdiff_t>(count));
+    std::vector<PrivacyReport> reports;
+    for (std::size_t i = 0; i < count; ++i)
+        reports.push_back(privatised(ledger->secret, key, chosen[i].second, drawn->noise[i]));
+
+    ledger->debit(static_cast<int>(count), now.lived);
+    if (auto debited = writeLedger(*ledger); !debited) return std::unexpected(std::move(debited.error()));
+    if (auto added = addReports(reports); !added) return std::unexpected(std::move(added.error()));
+    return count;
+}
+
+Result<PrivacyLedger> PrivacyRecorder::readLedger(const DeviceSecret& newSecret) const
 {
     const auto bytes = _files.read(_directory / "ledger", kMaximumFile);
     if (bytes) return PrivacyLedger::parse(bytes->view());
     if (bytes.error().code != ENOENT) return std::unexpected(bytes.error());
-    PrivacyLedger ledger;
-    if (!_random(ledger.secret)) return failure(kPrivacyNoRandomness, "no randomness for a secret");
-    return ledger;
+    return PrivacyLedger{.secret = newSecret};
 }
 
-Result<std::vector<PrivacyReport>> PrivacyRecorder::privatise(const DeviceSecret& secret, std::string_view key,
-                                                              const std::set<std::string>& texts, int count) const
+Result<void> PrivacyRecorder::writeLedger(const PrivacyLedger& ledger)
 {
-    Generator generator(_random);
-    std::vector<std::string_view> chosen;
-    std::ranges::sample(texts, std::back_inserter(chosen), count, generator);
-    std::vector<PrivacyReport> reports;
-    bool failed = generator.failed();
-    for (const std::string_view text : chosen) {
-        PrivacyRandom random{};
-        failed |= !_random(random);
-        reports.push_back(privatised(secret, key, text, random));
-    }
-    if (failed) return failure(kPrivacyNoRandomness, "no randomness for reports");
-    return reports;
+    return _files.writeAtomically(_directory / "ledger", ledger.text());
 }
 
 Result<void> PrivacyRecorder::addReports(const std::vector<PrivacyReport>& reports)

@@ -43,14 +43,16 @@ public:
     PrivacyRecorder(FileSystem& files, Clock& clock, std::filesystem::path directory,
                     RandomBytes random = systemRandomBytes);
 
-    /// Records texts under a key. Where the budget has not enough left for all, a random choice of them. An error where
-    /// it has nothing left (`kPrivacyBudgetExhausted`) and where nothing could be recorded for another reason.
-    [[nodiscard]] Result<void> record(std::string_view key, const std::set<std::string>& texts);
+    /// Records texts under a key and returns how many of them: if the budget doesn't suffice for all, a random choice.
+    /// Fails if the budget is used up (`kPrivacyBudgetExhausted`), if there is no randomness (`kPrivacyNoRandomness`),
+    /// or with the error of the file that couldn't be read or written.
+    [[nodiscard]] Result<std::size_t> record(std::string_view key, const std::set<std::string>& texts);
 
 private:
-    [[nodiscard]] Result<PrivacyLedger> readLedger() const;
-    [[nodiscard]] Result<std::vector<PrivacyReport>> privatise(const DeviceSecret& secret, std::string_view key,
-                                                               const std::set<std::string>& texts, int count) const;
+    struct Drawn;
+    [[nodiscard]] Result<Drawn> draw(std::size_t texts) const;
+    [[nodiscard]] Result<PrivacyLedger> readLedger(const DeviceSecret& newSecret) const;
+    [[nodiscard]] Result<void> writeLedger(const PrivacyLedger& ledger);
     [[nodiscard]] Result<void> addReports(const std::vector<PrivacyReport>& reports);
 
     FileSystem& _files;
