@@ -79,10 +79,14 @@ std::vector<Row> httpCache()
     platform::RunLoop loop;
     const auto clock = platform::makeSystemClock(loop);
     platform::WorkerPool pool;
+    const auto system = platform::makeSystemFiles();
     const auto queue = platform::Queue::make("bench.httpCache", platform::Queue::Kind::Serial, pool, *clock);
     const auto open = [&](std::size_t memory) {
-        return platform::HttpCache::make(
-            {.memoryCapacity = memory, .directory = directory / "http", .queue = queue, .clock = clock.get()});
+        return platform::HttpCache::make({.memoryCapacity = memory,
+                                          .directory = directory / "http",
+                                          .files = system.get(),
+                                          .queue = queue,
+                                          .clock = clock.get()});
     };
     std::vector<std::string> bodies, files;
     {

@@ -4,6 +4,7 @@
 #include <unistd.h>
 
 #include "fuzz/Check.h"
+#include "platform/files/Files.h"
 #include "platform/net/HttpCachePolicy.h"
 #include "platform/net/HttpCacheStore.h"
 #include "tests/support/TemporaryDirectory.h"
@@ -57,10 +58,16 @@ void judge(HttpHeaders headers)
     check(confirmed(stored, notModified, kNow, kNow).body == stored.body);
 }
 
+FileSystem& files()
+{
+    static const std::unique_ptr<FileSystem> system = makeSystemFiles();
+    return *system;
+}
+
 /// What was kept is found as it was, or not at all; and a cache that was opened works.
 void use(const fs::path& directory)
 {
-    auto store = HttpCacheStore::open(directory, kLimits);
+    auto store = HttpCacheStore::open(files(), directory, kLimits);
     check(store.has_value(), store ? "" : store.error().description());
     (void)(*store)->keys();
     for (const std::size_t size : {10u, 100u}) {
@@ -93,7 +100,7 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
     std::string index(input);
     if (input.starts_with("~")) {
         {
-            auto store = HttpCacheStore::open(directory.path, kLimits).value();
+            auto store = HttpCacheStore::open(files(), directory.path, kLimits).value();
             for (const std::size_t body : {10u, 100u}) {
                 const std::string key = "http://a/" + std::to_string(body);
                 check(store->put(key, answerFor(key, body)).has_value());

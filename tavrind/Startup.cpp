@@ -49,6 +49,7 @@ platform::UrlSessionConfiguration foregroundConfiguration(const platform::Device
                                                       .minimumMappedSize = 16384,
                                                       .directory =
                                                           device.directories.caches / "com.quorvane.tavrind" / "http",
+                                                      .files = &device.files,
                                                       .queue = device.serialQueue("com.quorvane.tavrind.httpCache"),
                                                       .clock = &device.clock}};
 }

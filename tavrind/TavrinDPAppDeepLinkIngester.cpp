@@ -83,7 +83,8 @@ void TavrinDPAppDeepLinkIngester::scheduleMaintenanceWithName(std::string name)
 
 void TavrinDPAppDeepLinkIngester::ingestStartingOn(platform::Date start, platform::Date end)
 {
-    const auto events = platform::AppActivities(_assembly.device.directories.data / knowledgeDirectoryPath)
+    const platform::Device& device = _assembly.device;
+    const auto events = platform::AppActivities(device.files, device.directories.data / knowledgeDirectoryPath)
                             .queryAppActivitiesAfterDate(start, end, kMaximumEvents);
     if (!events) log().log("no app activities: {}", events.error().description());
     const auto entries = events ? DeepLinks::deepLinksFor(*events) : std::vector<DeepLinkEntry>();

@@ -58,7 +58,7 @@ Sqlite::Parameter parameter(const std::optional<std::string>& text)
 
 Result<std::vector<AppActivity>> AppActivities::queryAppActivitiesAfterDate(Date from, Date to, std::size_t limit) const
 {
-    auto database = Sqlite::open(_path, Sqlite::Access::ReadOnly);
+    auto database = _files.openDatabase(_path, Sqlite::Access::ReadOnly);
     if (!database) return std::unexpected(std::move(database.error()));
     const auto version = versionOf(*database);
     if (!version) return std::unexpected(version.error());
@@ -88,8 +88,8 @@ Result<void> AppActivities::add(const AppActivity& activity, Date now) const
     const auto oldest = std::chrono::floor<seconds>(now) - kKeptFor;
     if (start < oldest) return failure("it began more than seven days ago, and earlier activities are not kept");
 
-    if (auto made = makeSystemFiles()->createDirectories(_path.parent_path()); !made) return made;
-    auto database = Sqlite::open(_path, Sqlite::Access::Shared);
+    if (auto made = _files.createDirectories(_path.parent_path()); !made) return made;
+    auto database = _files.openDatabase(_path, Sqlite::Access::Shared);
     if (!database) return std::unexpected(std::move(database.error()));
     return database->transaction([&]() -> Result<void> {
         const auto version = versionOf(*database);

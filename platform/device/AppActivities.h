@@ -11,6 +11,8 @@
 
 namespace platform {
 
+class FileSystem;
+
 /// Something that the user did in an application, as the application told it.
 struct AppActivity {
     Date start; ///< whole seconds
@@ -27,8 +29,10 @@ public:
     /// Those that began earlier are forgotten when one is added.
     static constexpr auto kKeptFor = std::chrono::days(7);
 
-    /// `directory` holds the database; it need not be there.
-    explicit AppActivities(const std::filesystem::path& directory) : _path(directory / "app-activities.db") {}
+    /// `directory` holds the database, which need not be there. `files` must outlive this.
+    AppActivities(FileSystem& files, const std::filesystem::path& directory)
+        : _files(files), _path(directory / "app-activities.db")
+    {}
 
     /// The activities that began from `from` to `to`, both included, by date; those of a second in the order in which
     /// they were added. The first `limit` of them. Reading waits for nobody: a database that isn't there, is locked,
@@ -41,7 +45,8 @@ public:
     [[nodiscard]] Result<void> add(const AppActivity& activity, Date now) const;
 
 private:
-    std::filesystem::path _path;
+    FileSystem& _files;
+    const std::filesystem::path _path;
 };
 
 } // namespace platform

@@ -39,19 +39,35 @@ template <class Call> auto retried(Call call)
     return result;
 }
 
+/// A file may claim a date that nanoseconds since 1970 don't hold.
 Date dateOf(const statx_timestamp& time)
 {
-    return Date(std::chrono::seconds(time.tv_sec) + std::chrono::nanoseconds(time.tv_nsec));
+    return dateFromSecondsSince1970(static_cast<double>(time.tv_sec)) + std::chrono::nanoseconds(time.tv_nsec);
 }
 
-bool copyAll(int from, int to)
+/// Copies the whole of `from`. False, with errno, if that fails or it is more than `maximumSize` bytes (EFBIG).
+bool copyAll(int from, int to, std::uint64_t maximumSize)
 {
     std::array<char, 64 * 1024> chunk;
-    while (true) {
-        const ssize_t count = retried([&] { return read(from, chunk.data(), chunk.size()); });
+    off_t offset = 0;
+    bool byKernel = true; // until it says that it can't
+    while (static_cast<std::uint64_t>(offset) <= maximumSize) {
+        ssize_t count = 0;
+        if (byKernel) {
+            count = retried([&] { return copy_file_range(from, &offset, to, nullptr, 8u << 20, 0); });
+            if (count < 0 && errno != ENOSPC && errno != EDQUOT && offset == 0) {
+                byKernel = false;
+                continue;
+            }
+        } else {
+            count = retried([&] { return pread(from, chunk.data(), chunk.size(), offset); });
+            if (count > 0 && !writeAll(to, {chunk.data(), static_cast<std::size_t>(count)})) return false;
+            offset += std::max<ssize_t>(count, 0);
+        }
         if (count <= 0) return count == 0;
-        if (!writeAll(to, {chunk.data(), static_cast<std::size_t>(count)})) return false;
     }
+    errno = EFBIG;
+    return false;
 }
 
 FileInfo infoOf(const struct statx& status)
@@ -63,6 +79,7 @@ FileInfo infoOf(const struct statx& status)
     info.size = status.stx_size;
     info.modified = dateOf(status.stx_mtime);
     info.created = status.stx_mask & STATX_BTIME ? dateOf(status.stx_btime) : info.modified;
+    info.number = status.stx_ino;
     return info;
 }
 
@@ -122,20 +139,19 @@ public:
     {
         auto file = openForReading(path);
         if (!file) return std::unexpected(std::move(file.error()));
-        std::string contents;
-        std::array<char, 64 * 1024> chunk;
-        while (true) {
-            const ssize_t count = retried([&] { return ::read(file->fd(), chunk.data(), chunk.size()); });
-            if (count < 0) return failure(path);
-            if (count == 0) return Bytes(std::move(contents));
-            contents.append(chunk.data(), static_cast<std::size_t>(count));
-            if (contents.size() > maximumSize) return std::unexpected(Error::posix(EFBIG, path.string()));
-        }
+        auto contents = readFile(*file, maximumSize);
+        if (!contents) return std::unexpected(Error::posix(static_cast<int>(contents.error().code), path.string()));
+        return contents;
     }
 
     Result<void> writeAtomically(const fs::path& path, std::string_view contents) override
     {
         return publish(path, [&](int fd) { return writeAll(fd, contents); });
+    }
+
+    Result<void> writeUnsynced(const fs::path& path, std::string_view contents) override
+    {
+        return publish(path, [&](int fd) { return writeAll(fd, contents); }, Sync::No);
     }
 
     Result<void> replace(const fs::path& path, const fs::path& source) override
@@ -148,15 +164,32 @@ public:
             return {}; // the source is gone
         }
         if (errno != EXDEV) return failure(path);
-        auto published = publish(path, [&](int fd) { return copyAll(file->fd(), fd); });
+        auto published = publish(path, [&](int fd) { return copyAll(file->fd(), fd, UINT64_MAX); });
         if (published) unlink(source.c_str());
         return published;
     }
 
-    Result<void> copy(const fs::path& path, const FileHandle& source) override
+    Result<void> copy(const fs::path& path, const FileHandle& source, std::uint64_t maximumSize) override
     {
-        if (lseek(source.fd(), 0, SEEK_SET) != 0) return std::unexpected(Error::posix(errno));
-        return publish(path, [&](int fd) { return copyAll(source.fd(), fd); });
+        return publish(path, [&](int fd) { return copyAll(source.fd(), fd, maximumSize); });
+    }
+
+    Result<FileHandle> create(const fs::path& path) override
+    {
+        unlink(path.c_str());
+        FileHandle file(
+            retried([&] { return open(path.c_str(), O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600); }));
+        if (!file) return failure(path);
+        return file;
+    }
+
+    Result<void> sync(const fs::path& path) override
+    {
+        const auto file = openForReading(path);
+        if (!file) return std::unexpected(file.error());
+        const FileHandle directory = openDirectory(path.parent_path());
+        if (fsync(file->fd()) != 0 || !directory || fsync(directory.fd()) != 0) return failure(path);
+        return {};
     }
 
     Result<void> createDirectories(const fs::path& path) override
@@ -184,6 +217,14 @@ public:
     Result<void> remove(const fs::path& path) override
     {
         if (unlink(path.c_str()) != 0) return failure(path);
+        return {};
+    }
+
+    Result<void> removeDirectory(const fs::path& path) override
+    {
+        std::error_code error;
+        fs::remove_all(path, error);
+        if (error) return std::unexpected(Error::posix(error.value(), path.string()));
         return {};
     }
 
@@ -224,6 +265,23 @@ public:
         if (!file || flock(file.fd(), LOCK_EX | LOCK_NB) != 0) return failure(path);
         return file;
     }
+
+    Result<FileHandle> takeDirectory(const fs::path& path) override
+    {
+        if (auto made = createDirectories(path); !made) return std::unexpected(std::move(made.error()));
+        const FileHandle directory(open(path.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+        struct stat status{};
+        if (!directory || fstat(directory.fd(), &status) != 0) return failure(path);
+        if (status.st_uid != geteuid()) return std::unexpected(Error::posix(EPERM, path.string()));
+        if ((status.st_mode & 0077) != 0 && fchmod(directory.fd(), 0700) != 0) return failure(path);
+        return lock(path / "lock");
+    }
+
+    Result<Sqlite> openDatabase(const fs::path& path, Sqlite::Access access) override
+    {
+        return Sqlite::open(path, access);
+    }
+
     Result<FileHandle> createTemporary() override
     {
         FileHandle file(memfd_create("temporary", MFD_CLOEXEC));
@@ -232,16 +290,20 @@ public:
     }
 
 private:
+    enum class Sync { Yes, No };
+
     /// Writes a temporary file beside `path` with `fill`, and makes it `path`.
-    template <class Fill> static Result<void> publish(const fs::path& path, Fill fill)
+    template <class Fill> static Result<void> publish(const fs::path& path, Fill fill, Sync sync = Sync::Yes)
     {
         const fs::path temporary = path.string() + "." + Uuid::random().string().substr(0, 8) + ".tmp";
         FileHandle file(retried(
             [&] { return open(temporary.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600); }));
         if (!file) return failure(path);
-        const FileHandle directory = openDirectory(path.parent_path());
-        if (directory && fill(file.fd()) && fsync(file.fd()) == 0 && rename(temporary.c_str(), path.c_str()) == 0)
-            return fsync(directory.fd()) == 0 ? Result<void>() : failure(path.parent_path());
+        const FileHandle directory = sync == Sync::Yes ? openDirectory(path.parent_path()) : FileHandle();
+        const auto synced = [sync](const FileHandle& what) { return sync == Sync::No || fsync(what.fd()) == 0; };
+        if (fill(file.fd()) && synced(file) && (directory || sync == Sync::No) &&
+            rename(temporary.c_str(), path.c_str()) == 0)
+            return synced(directory) ? Result<void>() : failure(path.parent_path());
         auto error = failure(path);
         unlink(temporary.c_str());
         return error;
@@ -275,27 +337,34 @@ fs::path home()
 
 } // namespace
 
-Result<LockedDirectory> LockedDirectory::open(const fs::path& path)
-{
-    const auto failure = [](const fs::path& what) { return std::unexpected(Error::posix(errno, what.string())); };
-    LockedDirectory opened{FileHandle(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC)), {}};
-    struct stat status{};
-    if (!opened.directory || fstat(opened.directory.fd(), &status) != 0) return failure(path);
-    if (status.st_uid != geteuid()) return std::unexpected(Error::posix(EPERM, path.string()));
-    if ((status.st_mode & 0077) != 0 && fchmod(opened.directory.fd(), 0700) != 0) return failure(path);
-    constexpr const char* kLock = "lock";
-    opened.lock =
-        FileHandle(openat(opened.directory.fd(), kLock, O_RDWR | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, 0600));
-    if (!opened.lock || flock(opened.lock.fd(), LOCK_EX | LOCK_NB) != 0) return failure(path / kLock);
-    return opened;
-}
-
 Result<FileInfo> fileInfo(const FileHandle& file)
 {
     struct statx status{};
     if (statx(file.fd(), "", AT_EMPTY_PATH, STATX_BASIC_STATS | STATX_BTIME, &status) != 0)
         return std::unexpected(Error::posix(errno));
     return infoOf(status);
+}
+
+Result<Bytes> readFile(const FileHandle& file, std::size_t maximumSize)
+{
+    std::string contents;
+    std::array<char, 64 * 1024> chunk;
+    while (true) {
+        const ssize_t count =
+            retried([&] { return pread(file.fd(), chunk.data(), chunk.size(), static_cast<off_t>(contents.size())); });
+        if (count < 0) return std::unexpected(Error::posix(errno));
+        if (count == 0) return Bytes(std::move(contents));
+        contents.append(chunk.data(), static_cast<std::size_t>(count));
+        if (contents.size() > maximumSize) return std::unexpected(Error::posix(EFBIG));
+    }
+}
+
+Result<Bytes> mapFile(const FileHandle& file, std::size_t size)
+{
+    void* address = mmap(nullptr, size, PROT_READ, MAP_PRIVATE | MAP_POPULATE, file.fd(), 0);
+    if (address == MAP_FAILED) return std::unexpected(Error::posix(errno));
+    const std::shared_ptr<const void> owner(address, [size](void* mapped) { munmap(mapped, size); });
+    return Bytes(owner, {static_cast<const char*>(address), size});
 }
 
 std::unique_ptr<FileSystem> makeSystemFiles()

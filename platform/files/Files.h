@@ -11,6 +11,7 @@
 #include "platform/base/Bytes.h"
 #include "platform/base/Date.h"
 #include "platform/base/FileHandle.h"
+#include "platform/files/Sqlite.h"
 #include "platform/values/Error.h"
 
 namespace platform {
@@ -20,7 +21,8 @@ struct FileInfo {
     Kind kind = Kind::File;
     std::uint64_t size = 0;
     Date modified;
-    Date created; ///< birth time where the file system has one, else `modified`
+    Date created;             ///< birth time if the file system has one, else `modified`
+    std::uint64_t number = 0; ///< the inode's: another file in the same place has another
 };
 
 /// A file that grows: whole records are added at its end. One thread at a time.
@@ -36,7 +38,7 @@ public:
 };
 
 /// The file system, as far as the device's services need it. Paths are absolute. The last component of a path is
-/// never followed when it is a link. Any thread.
+/// never followed when it is a link. Failures have the system's error number, in the domain "POSIX". Any thread.
 ///
 /// A twin in tests/support keeps files in memory and fails on demand.
 class FileSystem {
@@ -55,13 +57,24 @@ public:
     /// `source` is gone only after a success. Mode 0600.
     [[nodiscard]] virtual Result<void> replace(const std::filesystem::path& path,
                                                const std::filesystem::path& source) = 0;
-    /// Publishes a copy of what `source` holds as `path`, whole, like `writeAtomically`.
-    [[nodiscard]] virtual Result<void> copy(const std::filesystem::path& path, const FileHandle& source) = 0;
+    /// Publishes a copy of what `source` holds as `path`, whole, like `writeAtomically`. Fails with EFBIG if that is
+    /// more than `maximumSize` bytes.
+    [[nodiscard]] virtual Result<void> copy(const std::filesystem::path& path, const FileHandle& source,
+                                            std::uint64_t maximumSize = UINT64_MAX) = 0;
+    /// Like `writeAtomically`, but without syncing: after a power cut the file may be the old one, empty or damaged.
+    /// For what can be had again.
+    [[nodiscard]] virtual Result<void> writeUnsynced(const std::filesystem::path& path, std::string_view contents) = 0;
+    /// Makes an empty file, mode 0600, in place of any that is there, and opens it for reading and writing.
+    [[nodiscard]] virtual Result<FileHandle> create(const std::filesystem::path& path) = 0;
+    /// Returns once the file's contents and its name outlive a power cut.
+    [[nodiscard]] virtual Result<void> sync(const std::filesystem::path& path) = 0;
     /// Makes the directory and its parents, those made with mode 0700. One that is there already is fine.
     [[nodiscard]] virtual Result<void> createDirectories(const std::filesystem::path& path) = 0;
     [[nodiscard]] virtual Result<FileInfo> info(const std::filesystem::path& path) = 0;
     /// Removes a file; one that isn't there is an error (ENOENT).
     [[nodiscard]] virtual Result<void> remove(const std::filesystem::path& path) = 0;
+    /// Removes a directory with everything in it. One that isn't there is fine.
+    [[nodiscard]] virtual Result<void> removeDirectory(const std::filesystem::path& path) = 0;
     /// The names in a directory, in no order, without "." and "..".
     [[nodiscard]] virtual Result<std::vector<std::string>> list(const std::filesystem::path& path) = 0;
     [[nodiscard]] virtual Result<FileHandle> openForReading(const std::filesystem::path& path) = 0;
@@ -70,6 +83,12 @@ public:
     /// Locks a file, made where it is missing, against other processes, for as long as the handle lives. An error where
     /// another has it (EWOULDBLOCK).
     [[nodiscard]] virtual Result<FileHandle> lock(const std::filesystem::path& path) = 0;
+    /// Takes a directory for this process: makes it if it is missing, sets its mode to 0700, and locks the file "lock"
+    /// in it for as long as the handle lives. Fails for a link (ENOTDIR), for another user's (EPERM), and while another
+    /// process has it (EWOULDBLOCK).
+    [[nodiscard]] virtual Result<FileHandle> takeDirectory(const std::filesystem::path& path) = 0;
+    /// Opens a database as `Sqlite::open` does.
+    [[nodiscard]] virtual Result<Sqlite> openDatabase(const std::filesystem::path& path, Sqlite::Access access) = 0;
     /// A new, empty file in memory, for reading and writing: it goes with its last user. Without a name, for making one
     /// in a directory and removing it may take a file system's journal a quarter of a millisecond.
     [[nodiscard]] virtual Result<FileHandle> createTemporary() = 0;
@@ -77,18 +96,14 @@ public:
 
 [[nodiscard]] std::unique_ptr<FileSystem> makeSystemFiles();
 
-/// About an open file. Any thread.
+// Of open files. Any thread.
+
 [[nodiscard]] Result<FileInfo> fileInfo(const FileHandle& file);
-
-/// A directory of one process's own: mode 0700, with a file "lock" that is locked as long as this lives. It and the
-/// lock must not be links.
-struct LockedDirectory {
-    FileHandle directory;
-    FileHandle lock;
-
-    /// An error where it isn't there, isn't ours, or another process has it (EWOULDBLOCK).
-    [[nodiscard]] static Result<LockedDirectory> open(const std::filesystem::path& path);
-};
+/// The whole file, whatever the handle's position. Fails with EFBIG if it is larger than `maximumSize` bytes.
+[[nodiscard]] Result<Bytes> readFile(const FileHandle& file, std::size_t maximumSize);
+/// Maps the first `size` bytes, read-only; the last copy of the bytes unmaps them. `size` must not be 0 (EINVAL). Only
+/// for a file that nobody shortens while it is in use: reading beyond its end kills the process.
+[[nodiscard]] Result<Bytes> mapFile(const FileHandle& file, std::size_t size);
 
 /// The user's directories. Made on first use by whoever writes there, never at start-up.
 struct Directories {

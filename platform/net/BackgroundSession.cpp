@@ -6,8 +6,6 @@
 #include <mutex>
 #include <random>
 #include <set>
-#include <sys/stat.h>
-#include <unistd.h>
 
 #include <fmt/format.h>
 
@@ -152,7 +150,7 @@ public:
     }
     Result<std::shared_ptr<BackgroundTask>> uploadTask(UrlRequest request, const fs::path& body) override
     {
-        const auto file = makeSystemFiles()->openForReading(body);
+        const auto file = _environment.files.openForReading(body);
         if (!file) return std::unexpected(file.error());
         return _queue->sync([&] { return _add(std::move(request), &*file); });
     }
@@ -309,12 +307,12 @@ void Task::setNote(Value note)
 void Session::_openStore(bool make)
 {
     const fs::path directory = _environment.directory / folderName(_configuration.identifier);
-    if (_store || _storeError || (!make && !BackgroundStore::exists(directory))) return;
-    auto store = BackgroundStore::open(directory);
+    if (_store || _storeError || (!make && !BackgroundStore::exists(_environment.files, directory))) return;
+    auto store = BackgroundStore::open(_environment.files, directory);
     if (!store) {
         const Error error = store.error();
         defaultLog().error("background transfers can't be kept in {}: {}", directory.string(), error.description());
-        store = BackgroundStore::openTemporary(_environment.temporary);
+        store = BackgroundStore::openTemporary(_environment.files, _environment.temporary);
         if (!store) _storeError = store.error();
         _tell([error](BackgroundSessionDelegate& delegate) { delegate.sessionDidBecomeInvalid(error); });
     }
@@ -337,9 +335,7 @@ void Session::_takeUp(BackgroundStore::Contents contents)
         stored.deadline = std::min(stored.deadline, now + kLongestResourceTimeout);
         stored.notBefore = std::min(stored.notBefore, now + kLongestHold);
         // Whoever was told of a download may have moved its file away and been killed then.
-        struct stat status{};
-        if (!stored.isUpload && stored.outcome && !stored.outcome->error &&
-            lstat(_store->downloadPath(stored.identifier).c_str(), &status) != 0)
+        if (!stored.isUpload && stored.outcome && !stored.outcome->error && !_store->hasDownload(stored.identifier))
             stored.outcome.reset();
 
         Entry& entry = _entries[stored.identifier];
@@ -584,11 +580,11 @@ void Session::_report(const Entry& entry)
 {
     const auto& [response, error] = *entry.stored.outcome;
     const std::uint64_t identifier = entry.stored.identifier;
-    _tell([weak = weak_from_this(), task = entry.kept, response, error,
+    _tell([weak = weak_from_this(), task = entry.kept, response, error, &files = _environment.files,
            file = _store->downloadPath(identifier)](BackgroundSessionDelegate& delegate) {
         if (!task->isUpload() && response && !error) {
             delegate.taskDidFinishDownloading(task, file, *response);
-            unlink(file.c_str());
+            (void)files.remove(file);
         }
         delegate.taskDidComplete(task, response, error);
         if (auto self = weak.lock())

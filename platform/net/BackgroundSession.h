@@ -14,6 +14,7 @@ namespace platform {
 
 class Clock;
 class Executor;
+class FileSystem;
 class NetworkStatus;
 class Queue;
 
@@ -111,6 +112,7 @@ public:
 
 /// What background sessions work with; all of it must outlive them.
 struct BackgroundEnvironment {
+    FileSystem& files;
     UrlLoader& loader;
     NetworkStatus& network;
     Clock& clock;

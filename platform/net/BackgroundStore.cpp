@@ -4,15 +4,11 @@
 #include <array>
 #include <cerrno>
 #include <charconv>
-#include <fcntl.h>
-#include <set>
-#include <stdlib.h>
-#include <sys/stat.h>
-#include <unistd.h>
 
 #include <fmt/format.h>
 
 #include "platform/base/Log.h"
+#include "platform/base/Uuid.h"
 #include "platform/values/Dictionary.h"
 #include "platform/values/Json.h"
 #include "platform/values/ValueCoder.h"
@@ -26,6 +22,8 @@ namespace {
 constexpr const char* kDatabase = "transfers.db";
 constexpr std::string_view kBodySuffix = ".body";
 constexpr std::string_view kDownloadSuffix = ".download";
+/// Of a copy that a kill left half made.
+constexpr std::string_view kUnfinishedSuffix = ".tmp";
 constexpr std::string_view kTemporaryPrefix = "background-transfers-";
 /// Of the tables below; a store of another version is begun anew.
 constexpr std::int64_t kVersion = 1;
@@ -48,11 +46,6 @@ CREATE TABLE hold (host TEXT PRIMARY KEY, until INTEGER NOT NULL);
 CREATE TABLE time (one INTEGER PRIMARY KEY CHECK (one = 1), lived INTEGER NOT NULL, wall INTEGER NOT NULL);
 PRAGMA user_version = 1;
 )";
-
-std::unexpected<Error> failure(const fs::path& path)
-{
-    return std::unexpected(Error::posix(errno, path.string()));
-}
 
 // ---- values ----
 
@@ -159,50 +152,6 @@ Sqlite::Parameter parameter(const std::optional<std::string>& text)
 
 // ---- files ----
 
-/// Copies all of `from`; a file system that can share the blocks does.
-Result<std::uint64_t> copy(const FileHandle& from, const FileHandle& to, std::uint64_t maximum)
-{
-    struct stat status{};
-    if (fstat(from.fd(), &status) != 0) return std::unexpected(Error::posix(errno));
-    std::uint64_t copied = 0;
-    const auto tooLarge = [&] { return copied > maximum || static_cast<std::uint64_t>(status.st_size) > maximum; };
-    bool byKernel = true;
-    std::vector<char> chunk;
-    while (!tooLarge()) {
-        ssize_t count = 0;
-        loff_t offset = static_cast<loff_t>(copied);
-        if (byKernel) {
-            count = copy_file_range(from.fd(), &offset, to.fd(), nullptr, 8u << 20, 0);
-            byKernel = count >= 0 || errno == EINTR;
-            if (!byKernel && errno == ENOSPC) return std::unexpected(Error::posix(errno));
-            if (count < 0) continue;
-        } else {
-            chunk.resize(64u << 10);
-            count = pread(from.fd(), chunk.data(), chunk.size(), offset);
-            for (ssize_t written = 0; written < count;) {
-                const ssize_t more = write(to.fd(), chunk.data() + written, static_cast<std::size_t>(count - written));
-                if (more < 0 && errno != EINTR) return std::unexpected(Error::posix(errno));
-                written += std::max<ssize_t>(more, 0);
-            }
-            if (count < 0 && errno == EINTR) continue;
-            if (count < 0) return std::unexpected(Error::posix(errno));
-        }
-        if (count == 0) return copied;
-        copied += static_cast<std::uint64_t>(count);
-    }
-    return std::unexpected(Error::withReason(std::string(kUrlErrorDomain), kUrlTooLarge,
-                                             "the bodies of the waiting uploads are too large together"));
-}
-
-/// A new file in place of any that is there.
-Result<FileHandle> createAnew(const fs::path& path)
-{
-    unlink(path.c_str());
-    FileHandle file(open(path.c_str(), O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600));
-    if (!file) return failure(path);
-    return file;
-}
-
 /// The identifier in the name of a task's file.
 std::optional<std::uint64_t> identifierOf(std::string_view name)
 {
@@ -213,57 +162,42 @@ std::optional<std::uint64_t> identifierOf(std::string_view name)
     return ours && whole ? std::optional(identifier) : std::nullopt;
 }
 
-std::vector<std::string> namesIn(const fs::path& directory)
-{
-    return makeSystemFiles()->list(directory).value_or(std::vector<std::string>());
-}
-
-void removeDatabase(const fs::path& directory)
-{
-    for (const char* suffix : {"", "-wal", "-journal", "-shm"})
-        unlink((directory / (kDatabase + std::string(suffix))).c_str());
-}
-
 } // namespace
 
-bool BackgroundStore::exists(const fs::path& directory)
+bool BackgroundStore::exists(FileSystem& files, const fs::path& directory)
 {
-    struct stat status{};
-    return lstat((directory / kDatabase).c_str(), &status) == 0;
+    return files.info(directory / kDatabase).has_value();
 }
 
-Result<std::unique_ptr<BackgroundStore>> BackgroundStore::open(const fs::path& directory)
+Result<std::unique_ptr<BackgroundStore>> BackgroundStore::open(FileSystem& files, const fs::path& directory)
 {
-    if (auto made = makeSystemFiles()->createDirectories(directory); !made)
-        return std::unexpected(std::move(made.error()));
-    auto opened = LockedDirectory::open(directory);
-    if (!opened) return std::unexpected(std::move(opened.error()));
-    std::unique_ptr<BackgroundStore> store(new BackgroundStore(directory, std::move(*opened)));
+    auto lock = files.takeDirectory(directory);
+    if (!lock) return std::unexpected(std::move(lock.error()));
+    std::unique_ptr<BackgroundStore> store(new BackgroundStore(files, directory, std::move(*lock)));
     auto database = store->openDatabase();
     if (!database && Sqlite::isDamage(database.error())) {
         defaultLog().error("background transfers {} are damaged and begun anew: {}", directory.string(),
                            database.error().description());
         store->_database.reset();
         store->_contents = {};
-        removeDatabase(directory);
+        for (const char* suffix : {"", "-wal", "-journal", "-shm"})
+            (void)files.remove(directory / (kDatabase + std::string(suffix)));
         database = store->openDatabase();
     }
     if (!database) return std::unexpected(std::move(database.error()));
     return store;
 }
 
-Result<std::unique_ptr<BackgroundStore>> BackgroundStore::openTemporary(const fs::path& parent)
+Result<std::unique_ptr<BackgroundStore>> BackgroundStore::openTemporary(FileSystem& files, const fs::path& parent)
 {
-    std::error_code ignored;
-    for (const std::string& entry : namesIn(parent)) {
-        if (!entry.starts_with(kTemporaryPrefix)) continue;
-        if (const auto unused = LockedDirectory::open(parent / entry)) fs::remove_all(parent / entry, ignored);
+    for (const std::string& name : files.list(parent).value_or(std::vector<std::string>())) {
+        if (!name.starts_with(kTemporaryPrefix)) continue;
+        if (const auto unused = files.takeDirectory(parent / name)) (void)files.removeDirectory(parent / name);
     }
-    std::string name = (parent / (std::string(kTemporaryPrefix) + "XXXXXX")).string();
-    if (!mkdtemp(name.data())) return failure(parent);
-    auto store = open(name);
+    const fs::path directory = parent / (std::string(kTemporaryPrefix) + Uuid::random().string());
+    auto store = open(files, directory);
     if (!store) {
-        fs::remove_all(name, ignored);
+        (void)files.removeDirectory(directory);
         return store;
     }
     (*store)->_temporary = true;
@@ -274,13 +208,12 @@ Result<std::unique_ptr<BackgroundStore>> BackgroundStore::openTemporary(const fs
 BackgroundStore::~BackgroundStore()
 {
     _database.reset();
-    std::error_code ignored;
-    if (_temporary) fs::remove_all(_directory, ignored);
+    if (_temporary) (void)_files.removeDirectory(_directory);
 }
 
 Result<void> BackgroundStore::openDatabase()
 {
-    auto database = Sqlite::open(_directory / kDatabase);
+    auto database = _files.openDatabase(_directory / kDatabase, Sqlite::Access::Exclusive);
     if (!database) return std::unexpected(std::move(database.error()));
     _database = std::move(*database);
     auto checked = checkDatabase();
@@ -334,11 +267,10 @@ Result<void> BackgroundStore::load()
 
 void BackgroundStore::sweep(const std::vector<StoredTask>& tasks) const
 {
-    for (const std::string& name : namesIn(_directory)) {
+    for (const std::string& name : _files.list(_directory).value_or(std::vector<std::string>())) {
         const auto identifier = identifierOf(name);
-        if (!identifier) continue;
-        const auto owner = std::ranges::lower_bound(tasks, *identifier, {}, &StoredTask::identifier);
-        if (owner == tasks.end() || owner->identifier != *identifier) unlink((_directory / name).c_str());
+        const bool isOwned = identifier && std::ranges::binary_search(tasks, *identifier, {}, &StoredTask::identifier);
+        if (name.ends_with(kUnfinishedSuffix) || (identifier && !isOwned)) (void)_files.remove(_directory / name);
     }
 }
 
@@ -357,19 +289,22 @@ Result<void> BackgroundStore::add(StoredTask& task, const FileHandle* body, std:
         if (!body) return {};
 
         // The body is whole on disk before a task says that it has one.
-        auto file = createAnew(bodyPath(added.identifier));
-        if (!file) return std::unexpected(std::move(file.error()));
-        const auto size = copy(*body, *file, maximumBody);
-        if (!size) return std::unexpected(size.error());
-        if (!_temporary && (fsync(file->fd()) != 0 || fsync(_lock.directory.fd()) != 0)) return failure(_directory);
-        added.bodySize = *size;
+        const fs::path path = bodyPath(added.identifier);
+        if (auto copied = _files.copy(path, *body, maximumBody); !copied) {
+            if (copied.error().code != EFBIG) return copied;
+            return std::unexpected(Error::withReason(std::string(kUrlErrorDomain), kUrlTooLarge,
+                                                     "the bodies of the waiting uploads are too large together"));
+        }
+        const auto info = _files.info(path);
+        if (!info) return std::unexpected(info.error());
+        added.bodySize = info->size;
         return _database->run("UPDATE task SET bodySize = ? WHERE identifier = ?",
                               {static_cast<std::int64_t>(added.bodySize), static_cast<std::int64_t>(added.identifier)});
     });
     if (done)
         task = std::move(added);
     else if (added.identifier != 0)
-        unlink(bodyPath(added.identifier).c_str());
+        (void)_files.remove(bodyPath(added.identifier));
     return done;
 }
 
@@ -408,18 +343,18 @@ Result<void> BackgroundStore::forget(std::uint64_t identifier)
 {
     auto forgotten = _database->run("DELETE FROM task WHERE identifier = ?", {static_cast<std::int64_t>(identifier)});
     if (!forgotten) return forgotten;
-    unlink(bodyPath(identifier).c_str());
-    unlink(downloadPath(identifier).c_str());
+    (void)_files.remove(bodyPath(identifier));
+    (void)_files.remove(downloadPath(identifier));
     return {};
 }
 
 Result<FileHandle> BackgroundStore::openBody(const StoredTask& task) const
 {
-    auto file = makeSystemFiles()->openForReading(bodyPath(task.identifier));
+    auto file = _files.openForReading(bodyPath(task.identifier));
     if (!file) return file;
-    struct stat status{};
-    if (fstat(file->fd(), &status) != 0) return failure(_directory);
-    if (static_cast<std::uint64_t>(status.st_size) != task.bodySize)
+    const auto info = fileInfo(*file);
+    if (!info) return std::unexpected(info.error());
+    if (info->size != task.bodySize)
         return std::unexpected(Error::withReason(std::string(kPosixErrorDomain), EIO, "the body was changed on disk"));
     return file;
 }
@@ -434,18 +369,19 @@ fs::path BackgroundStore::downloadPath(std::uint64_t identifier) const
     return _directory / fmt::format("{}{}", identifier, kDownloadSuffix);
 }
 
+bool BackgroundStore::hasDownload(std::uint64_t identifier) const
+{
+    return _files.info(downloadPath(identifier)).has_value();
+}
+
 Result<FileHandle> BackgroundStore::createDownload(std::uint64_t identifier) const
 {
-    return createAnew(downloadPath(identifier));
+    return _files.create(downloadPath(identifier));
 }
 
 Result<void> BackgroundStore::syncDownload(std::uint64_t identifier) const
 {
-    if (_temporary) return {};
-    const fs::path path = downloadPath(identifier);
-    const FileHandle file(::open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
-    if (!file || fsync(file.fd()) != 0 || fsync(_lock.directory.fd()) != 0) return failure(path);
-    return {};
+    return _temporary ? Result<void>() : _files.sync(downloadPath(identifier));
 }
 
 } // namespace platform

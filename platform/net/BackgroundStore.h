@@ -50,18 +50,20 @@ public:
     };
 
     /// Whether there is a store in that directory.
-    [[nodiscard]] static bool exists(const std::filesystem::path& directory);
-    /// Opens or makes it. An error where that can't be done, or another process has it open (EWOULDBLOCK).
-    [[nodiscard]] static Result<std::unique_ptr<BackgroundStore>> open(const std::filesystem::path& directory);
-    /// Makes one in a directory of its own under `parent`, which goes with the store. Those that killed processes left
-    /// there are removed.
-    [[nodiscard]] static Result<std::unique_ptr<BackgroundStore>> openTemporary(const std::filesystem::path& parent);
+    [[nodiscard]] static bool exists(FileSystem& files, const std::filesystem::path& directory);
+    /// Opens or makes it; `files` must outlive it. Fails with EWOULDBLOCK while another process has it open.
+    [[nodiscard]] static Result<std::unique_ptr<BackgroundStore>> open(FileSystem& files,
+                                                                       const std::filesystem::path& directory);
+    /// Makes one in a directory of its own under `parent`, which is removed with the store. Removes those that killed
+    /// processes left there.
+    [[nodiscard]] static Result<std::unique_ptr<BackgroundStore>> openTemporary(FileSystem& files,
+                                                                                const std::filesystem::path& parent);
     ~BackgroundStore();
 
     /// What was in the store when it was opened. Once.
     [[nodiscard]] Contents takeContents() { return std::exchange(_contents, {}); }
-    /// Adds the task with a copy of `body` (none: it has no body), `maximumBody` bytes at most, and sets its identifier
-    /// and size. Nothing is left of a task that couldn't be added.
+    /// Adds the task with a copy of `body` (null for none), and sets its identifier and size. Fails with kUrlTooLarge
+    /// if the body has more than `maximumBody` bytes. Nothing is left of a task that couldn't be added.
     [[nodiscard]] Result<void> add(StoredTask& task, const FileHandle* body, std::uint64_t maximumBody);
     /// Keeps what has changed of it; the request and the body can't.
     [[nodiscard]] Result<void> save(const StoredTask& task, const LivedTime::Mark& time);
@@ -69,17 +71,19 @@ public:
     /// Removes the task and its files.
     [[nodiscard]] Result<void> forget(std::uint64_t identifier);
 
+    /// Fails with EIO if the file no longer has the size that was copied.
     [[nodiscard]] Result<FileHandle> openBody(const StoredTask& task) const;
     /// Where a download's body goes.
     [[nodiscard]] std::filesystem::path downloadPath(std::uint64_t identifier) const;
+    [[nodiscard]] bool hasDownload(std::uint64_t identifier) const;
     /// A new, empty file there, in place of what an earlier attempt left.
     [[nodiscard]] Result<FileHandle> createDownload(std::uint64_t identifier) const;
-    /// Makes sure that the downloaded file outlives a power cut.
+    /// Returns once the downloaded file outlives a power cut.
     [[nodiscard]] Result<void> syncDownload(std::uint64_t identifier) const;
 
 private:
-    BackgroundStore(std::filesystem::path directory, LockedDirectory lock)
-        : _directory(std::move(directory)), _lock(std::move(lock))
+    BackgroundStore(FileSystem& files, std::filesystem::path directory, FileHandle lock)
+        : _files(files), _directory(std::move(directory)), _lock(std::move(lock))
     {}
     [[nodiscard]] Result<void> openDatabase();
     [[nodiscard]] Result<void> checkDatabase();
@@ -88,8 +92,9 @@ private:
     [[nodiscard]] Result<void> saveTime(const LivedTime::Mark& time);
     void sweep(const std::vector<StoredTask>& tasks) const;
 
-    std::filesystem::path _directory;
-    LockedDirectory _lock;
+    FileSystem& _files;
+    const std::filesystem::path _directory;
+    const FileHandle _lock; // the directory is this process's while it lives
     std::optional<Sqlite> _database;
     Contents _contents;
     bool _temporary = false;

@@ -138,7 +138,7 @@ struct HttpCache::Impl : std::enable_shared_from_this<Impl> {
     const HttpCacheConfiguration configuration;
 
 private:
-    [[nodiscard]] bool hasDisk() const { return configuration.queue && !configuration.directory.empty(); }
+    [[nodiscard]] bool hasDisk() const { return configuration.files && !configuration.directory.empty(); }
     [[nodiscard]] static std::size_t hash(const std::string& key) { return std::hash<std::string>()(key); }
 
     // Under the mutex.
@@ -253,9 +253,9 @@ private:
         const std::uint64_t now = configuration.clock ? configuration.clock->hostTicks() : 0;
         if (closed && now < nextAttempt) return false;
         nextAttempt = now + static_cast<std::uint64_t>(kRetryDelay.count());
-        auto opened =
-            HttpCacheStore::open(configuration.directory, {.capacity = configuration.diskCapacity,
-                                                           .minimumMappedSize = configuration.minimumMappedSize});
+        auto opened = HttpCacheStore::open(
+            *configuration.files, configuration.directory,
+            {.capacity = configuration.diskCapacity, .minimumMappedSize = configuration.minimumMappedSize});
         auto keys = opened ? (*opened)->keys() : std::unexpected(opened.error());
         if (opened && !keys && HttpCacheStore::isDamage(keys.error())) {
             logFailure(keys.error());

@@ -2,19 +2,13 @@
 
 #include <algorithm>
 #include <array>
-#include <cerrno>
 #include <charconv>
 #include <cstring>
-#include <fcntl.h>
-#include <sys/mman.h>
-#include <sys/stat.h>
-#include <unistd.h>
 
 #include <fmt/format.h>
 #include <sqlite3.h>
 
 #include "platform/base/Log.h"
-#include "platform/base/WriteAll.h"
 
 namespace platform {
 
@@ -23,8 +17,9 @@ namespace fs = std::filesystem;
 namespace {
 
 constexpr const char* kIndex = "index.db";
-constexpr const char* kTemporary = "new";
 constexpr std::string_view kBodySuffix = ".body";
+/// Of a body that a kill left half written.
+constexpr std::string_view kUnfinishedSuffix = ".tmp";
 /// What an entry takes beside its texts and body, about.
 constexpr std::uint64_t kEntrySize = 1024;
 /// Uses are saved with the next change, and when there are so many.
@@ -41,11 +36,6 @@ constexpr std::array kSchema{
     "CREATE TABLE answer (id INTEGER PRIMARY KEY, status INTEGER NOT NULL, url TEXT NOT NULL, headers TEXT NOT NULL,"
     " selecting TEXT NOT NULL, requested INTEGER NOT NULL, received INTEGER NOT NULL, bodySize INTEGER NOT NULL,"
     " digest INTEGER NOT NULL, body TEXT)"};
-
-std::unexpected<Error> failure(const fs::path& path)
-{
-    return std::unexpected(Error::posix(errno, path.string()));
-}
 
 /// Header fields as lines; one with a line end in it can't have come by HTTP, and is left out.
 std::string linesOf(const HttpHeaders& headers)
@@ -124,11 +114,6 @@ std::optional<std::int64_t> idOf(std::string_view name)
     return read.ec == std::errc() && read.ptr == end ? std::optional(id) : std::nullopt;
 }
 
-std::string nameOf(std::int64_t id)
-{
-    return fmt::format("{}{}", id, kBodySuffix);
-}
-
 } // namespace
 
 /// Of the table "answer".
@@ -154,13 +139,12 @@ struct HttpCacheStore::Row {
     }
 };
 
-Result<std::unique_ptr<HttpCacheStore>> HttpCacheStore::open(const fs::path& directory, const Limits& limits)
+Result<std::unique_ptr<HttpCacheStore>> HttpCacheStore::open(FileSystem& files, const fs::path& directory,
+                                                             const Limits& limits)
 {
-    if (auto made = makeSystemFiles()->createDirectories(directory); !made)
-        return std::unexpected(std::move(made.error()));
-    auto lock = LockedDirectory::open(directory);
+    auto lock = files.takeDirectory(directory);
     if (!lock) return std::unexpected(std::move(lock.error()));
-    std::unique_ptr<HttpCacheStore> store(new HttpCacheStore(directory, limits, std::move(*lock)));
+    std::unique_ptr<HttpCacheStore> store(new HttpCacheStore(files, directory, limits, std::move(*lock)));
     auto opened = store->openIndex();
     if (!opened && isDamage(opened.error())) {
         defaultLog().error("the HTTP cache {} is damaged and begun anew: {}", directory.string(),
@@ -186,8 +170,8 @@ bool HttpCacheStore::isDamage(const Error& error)
 
 bool HttpCacheStore::isInPlace() const
 {
-    struct stat status{};
-    return lstat((_directory / kIndex).c_str(), &status) == 0 && status.st_ino == _indexInode;
+    const auto info = _files.info(_directory / kIndex);
+    return info && info->number == _indexNumber;
 }
 
 Result<void> HttpCacheStore::beginAnew()
@@ -195,20 +179,20 @@ Result<void> HttpCacheStore::beginAnew()
     _index.reset();
     _uses.clear();
     _mappings.clear();
-    for (const std::string& name : makeSystemFiles()->list(_directory).value_or(std::vector<std::string>()))
-        if (idOf(name) || name == kTemporary || name.starts_with(kIndex))
-            unlinkat(_lock.directory.fd(), name.c_str(), 0);
+    for (const std::string& name : _files.list(_directory).value_or(std::vector<std::string>()))
+        if (idOf(name) || name.ends_with(kUnfinishedSuffix) || name.starts_with(kIndex))
+            (void)_files.remove(_directory / name);
     return openIndex();
 }
 
 Result<void> HttpCacheStore::openIndex()
 {
-    auto index = Sqlite::open(_directory / kIndex);
+    auto index = _files.openDatabase(_directory / kIndex, Sqlite::Access::Exclusive);
     if (!index) return std::unexpected(std::move(index.error()));
     _index.emplace(std::move(*index));
-    struct stat status{};
-    if (fstatat(_lock.directory.fd(), kIndex, &status, AT_SYMLINK_NOFOLLOW) != 0) return failure(_directory / kIndex);
-    _indexInode = status.st_ino;
+    const auto info = _files.info(_directory / kIndex);
+    if (!info) return std::unexpected(info.error());
+    _indexNumber = info->number;
     (void)_index->execute("PRAGMA synchronous = NORMAL"); // consistent after a power cut, if not of the last moment
 
     std::vector<std::string> schema;
@@ -244,10 +228,10 @@ Result<void> HttpCacheStore::sweep()
     });
     if (!read) return read;
     if (!sound) return std::unexpected(damaged("sizes or uses out of range"));
-    for (const std::string& name : makeSystemFiles()->list(_directory).value_or(std::vector<std::string>())) {
+    for (const std::string& name : _files.list(_directory).value_or(std::vector<std::string>())) {
         const auto id = idOf(name);
-        if ((id && !std::ranges::binary_search(ids, *id)) || name == kTemporary)
-            unlinkat(_lock.directory.fd(), name.c_str(), 0);
+        if ((id && !std::ranges::binary_search(ids, *id)) || name.ends_with(kUnfinishedSuffix))
+            (void)_files.remove(_directory / name);
     }
     return {};
 }
@@ -350,7 +334,7 @@ Result<std::vector<std::string>> HttpCacheStore::put(const std::string& key, con
         if (!step) return step;
         row.id = _index->lastInsertedRow();
         if (asFile)
-            if (auto written = writeBody(row.id, body); !written) return written;
+            if (auto written = _files.writeUnsynced(bodyPath(row.id), body); !written) return written;
         return _index->run("INSERT INTO answer VALUES (?, ?, ?, ?, ?, ?, ?, ?, ?, ?)",
                            {row.id, row.status, std::string_view(row.url), std::string_view(row.headers),
                             std::string_view(row.selecting), row.requested, row.received, row.bodySize, row.digest,
@@ -408,54 +392,40 @@ Result<void> HttpCacheStore::forget(const std::vector<std::int64_t>& ids)
     return {};
 }
 
-Result<void> HttpCacheStore::writeBody(std::int64_t id, std::string_view body) const
+fs::path HttpCacheStore::bodyPath(std::int64_t id) const
 {
-    const int directory = _lock.directory.fd();
-    const FileHandle file(
-        openat(directory, kTemporary, O_WRONLY | O_CREAT | O_TRUNC | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, 0600));
-    if (file && writeAll(file.fd(), body) && renameat(directory, kTemporary, directory, nameOf(id).c_str()) == 0)
-        return {};
-    auto failed = failure(_directory / nameOf(id));
-    unlinkat(directory, kTemporary, 0);
-    return failed;
+    return _directory / fmt::format("{}{}", id, kBodySuffix);
 }
 
-/// None where the file isn't there whole. A mapping that was kept is read only where its file still is.
+/// Returns nothing if the file isn't there whole. A kept mapping is used only while its file is still in place.
 std::optional<Bytes> HttpCacheStore::mapBody(std::int64_t id, std::uint64_t size)
 {
-    struct stat status{};
-    const std::string name = nameOf(id);
     if (const auto kept = std::ranges::find(_mappings, id, &Mapping::id); kept != _mappings.end()) {
-        if (fstatat(_lock.directory.fd(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0 &&
-            status.st_ino == kept->inode && static_cast<std::uint64_t>(status.st_size) == size &&
-            kept->body.size() == size) {
+        const auto info = _files.info(bodyPath(id));
+        if (info && info->number == kept->number && info->size == size && kept->body.size() == size) {
             _mappings.splice(_mappings.begin(), _mappings, kept);
             return kept->body;
         }
         _mappings.erase(kept);
     }
-    const FileHandle file(openat(_lock.directory.fd(), name.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
-    if (!file || fstat(file.fd(), &status) != 0 || !S_ISREG(status.st_mode) ||
-        static_cast<std::uint64_t>(status.st_size) != size)
-        return std::nullopt;
+    const auto file = _files.openForReading(bodyPath(id));
+    const auto info = file ? fileInfo(*file) : std::unexpected(file.error());
+    if (!info || info->size != size) return std::nullopt;
     if (size == 0) return Bytes();
-    void* bytes = mmap(nullptr, size, PROT_READ, MAP_PRIVATE | MAP_POPULATE, file.fd(), 0);
-    if (bytes == MAP_FAILED) return std::nullopt;
-    Bytes body(
-        std::shared_ptr<const void>(bytes, [size](const void* mapped) { munmap(const_cast<void*>(mapped), size); }),
-        std::string_view(static_cast<const char*>(bytes), size));
-    _mappings.push_front({id, status.st_ino, body});
+    auto body = mapFile(*file, size);
+    if (!body) return std::nullopt;
+    _mappings.push_front({id, info->number, *body});
     std::size_t all = 0;
     for (const Mapping& mapping : _mappings) all += mapping.body.size();
     for (; _mappings.size() > kMaximumMappings || all > kMostMapped; _mappings.pop_back())
         all -= _mappings.back().body.size();
-    return body;
+    return std::move(*body);
 }
 
 void HttpCacheStore::removeBody(std::int64_t id)
 {
     std::erase_if(_mappings, [id](const Mapping& mapping) { return mapping.id == id; });
-    unlinkat(_lock.directory.fd(), nameOf(id).c_str(), 0);
+    (void)_files.remove(bodyPath(id));
 }
 
 } // namespace platform

@@ -28,9 +28,9 @@ public:
         std::size_t minimumMappedSize = 0; ///< bodies of so many bytes are files of their own
     };
 
-    /// Opens or makes it. An error where that can't be done, or another process has it open (EWOULDBLOCK).
-    [[nodiscard]] static Result<std::unique_ptr<HttpCacheStore>> open(const std::filesystem::path& directory,
-                                                                      const Limits& limits);
+    /// Opens or makes it; `files` must outlive it. Fails with EWOULDBLOCK while another process has it open.
+    [[nodiscard]] static Result<std::unique_ptr<HttpCacheStore>>
+    open(FileSystem& files, const std::filesystem::path& directory, const Limits& limits);
     /// Notes what was used.
     ~HttpCacheStore();
 
@@ -55,27 +55,28 @@ private:
     struct Row;
     struct Mapping {
         std::int64_t id;
-        std::uint64_t inode;
+        std::uint64_t number; ///< of the file that is mapped
         Bytes body;
     };
-    HttpCacheStore(std::filesystem::path directory, const Limits& limits, LockedDirectory lock)
-        : _directory(std::move(directory)), _limits(limits), _lock(std::move(lock))
+    HttpCacheStore(FileSystem& files, std::filesystem::path directory, const Limits& limits, FileHandle lock)
+        : _files(files), _directory(std::move(directory)), _limits(limits), _lock(std::move(lock))
     {}
+    [[nodiscard]] std::filesystem::path bodyPath(std::int64_t id) const;
     [[nodiscard]] Result<void> openIndex();
     [[nodiscard]] Result<void> sweep();
-    [[nodiscard]] Result<void> writeBody(std::int64_t id, std::string_view body) const;
     [[nodiscard]] std::optional<Bytes> mapBody(std::int64_t id, std::uint64_t size);
     void removeBody(std::int64_t id);
     /// Forgets the entries; their files go with `removeBody`, once that has been committed.
     [[nodiscard]] Result<void> forget(const std::vector<std::int64_t>& ids);
     [[nodiscard]] Result<void> saveUses();
 
-    std::filesystem::path _directory;
+    FileSystem& _files;
+    const std::filesystem::path _directory;
     const Limits _limits;
-    LockedDirectory _lock;
+    const FileHandle _lock; // the directory is this process's while it lives
     std::optional<Sqlite> _index;
-    std::uint64_t _indexInode = 0;
-    std::uint64_t _size = 0; // of all entries
+    std::uint64_t _indexNumber = 0; // of the index's file
+    std::uint64_t _size = 0;        // of all entries
     std::int64_t _lastUse = 0;
     std::map<std::string, std::int64_t> _uses; // not in the index yet
     std::list<Mapping> _mappings;              // of the bodies found last, the latest first

@@ -21,6 +21,7 @@
 namespace platform {
 
 class Clock;
+class FileSystem;
 class HttpCache;
 class Queue;
 
@@ -114,7 +115,8 @@ struct HttpCacheConfiguration {
     std::uint64_t diskCapacity = 100u << 20; ///< bytes
     std::size_t minimumMappedSize = 16384;   ///< bodies of so many bytes are files of their own, mapped when read
     std::filesystem::path directory;         ///< made with the first need; empty: nothing is kept on disk
-    std::shared_ptr<Queue> queue;            ///< a serial one for the disk's work; none without a directory
+    FileSystem* files = nullptr;             ///< outlives the cache; null only without a directory
+    std::shared_ptr<Queue> queue;            ///< a serial one for the disk's work; null only without a directory
     Clock* clock = nullptr;                  ///< outlives the cache
 };
 

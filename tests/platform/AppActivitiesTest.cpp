@@ -45,7 +45,8 @@ struct AppActivitiesTest : testing::Test {
 
     test::TemporaryDirectory directory;
     const fs::path file = directory / "knowledge/app-activities.db";
-    const AppActivities store{directory / "knowledge"};
+    const std::unique_ptr<FileSystem> files = makeSystemFiles();
+    const AppActivities store{*files, directory / "knowledge"};
 };
 
 TEST_F(AppActivitiesTest, AreReadByDateWithinTheRangeAndTheLimit)

@@ -130,7 +130,9 @@ struct Process {
     NetworkStatus network;
     std::shared_ptr<Queue> queue = Queue::make("delegate", Queue::Kind::Serial, executor, clock);
     std::shared_ptr<Recorder> delegate = std::make_shared<Recorder>();
-    std::unique_ptr<BackgroundSessions> sessions = makeBackgroundSessions({.loader = loader,
+    std::unique_ptr<FileSystem> files = makeSystemFiles();
+    std::unique_ptr<BackgroundSessions> sessions = makeBackgroundSessions({.files = *files,
+                                                                           .loader = loader,
                                                                            .network = network,
                                                                            .clock = clock,
                                                                            .executor = executor,

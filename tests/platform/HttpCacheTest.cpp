@@ -12,6 +12,7 @@
 #include <gtest/gtest.h>
 
 #include "platform/base/Log.h"
+#include "platform/files/Files.h"
 #include "platform/net/HttpCacheStore.h"
 #include "platform/run/Queue.h"
 #include "tests/support/ManualClock.h"
@@ -31,6 +32,7 @@ Url url(int number)
 
 /// A cache in a directory, whose queue runs when the test says so, or when it is waited for.
 struct HttpCacheTest : testing::Test {
+    const std::unique_ptr<FileSystem> files = makeSystemFiles();
     ~HttpCacheTest() override
     {
         cache.reset();
@@ -43,6 +45,7 @@ struct HttpCacheTest : testing::Test {
                                  .diskCapacity = disk,
                                  .minimumMappedSize = 16384,
                                  .directory = directory / "http",
+                                 .files = files.get(),
                                  .queue = queue,
                                  .clock = &clock});
     }

@@ -142,7 +142,9 @@ TEST_F(TransferTest, ABackgroundUploadReachesTheServer)
     NetworkStatus network;
     network.set({});
     const auto waiter = std::make_shared<Waiter>();
-    const auto sessions = makeBackgroundSessions({.loader = *loader,
+    const auto files = makeSystemFiles();
+    const auto sessions = makeBackgroundSessions({.files = *files,
+                                                  .loader = *loader,
                                                   .network = network,
                                                   .clock = clock,
                                                   .executor = pool,

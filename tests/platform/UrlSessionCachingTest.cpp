@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include "platform/files/Files.h"
 #include "platform/net/HttpCache.h"
 #include "platform/values/Dictionary.h"
 #include "tests/support/FakeUrlLoader.h"
@@ -26,11 +27,15 @@ const HttpHeaders kFresh{{"Cache-Control", "max-age=60"}, {"ETag", "\"1\""}};
 
 /// A caching session whose loads the test answers by hand, on queues that it drains.
 struct CachingSessionTest : testing::Test {
+    const std::unique_ptr<FileSystem> files = makeSystemFiles();
     ~CachingSessionTest() override { executor.drain(); } // what waits keeps the cache
     void open(std::size_t memory = 1u << 20)
     {
-        cache = HttpCache::make(
-            {.memoryCapacity = memory, .directory = directory / "http", .queue = cacheQueue, .clock = &clock});
+        cache = HttpCache::make({.memoryCapacity = memory,
+                                 .directory = directory / "http",
+                                 .files = files.get(),
+                                 .queue = cacheQueue,
+                                 .clock = &clock});
         session = makeCachingSession(loads, cache, queue);
     }
     std::unique_ptr<Load> make(UrlRequest request = {.url = kUrl})
@@ -283,10 +288,14 @@ TEST_F(CachingSessionTest, CancelEndsATaskOnceWhereverItIs)
 
 /// With the real loader, a service on loopback, and threads.
 struct CachingLoaderTest : test::UrlLoads {
+    const std::unique_ptr<FileSystem> files = makeSystemFiles();
     [[nodiscard]] UrlSessionConfiguration configuration(std::size_t memory)
     {
-        return {.cache = HttpCacheConfiguration{
-                    .memoryCapacity = memory, .directory = directory / "http", .queue = cacheQueue, .clock = &clock}};
+        return {.cache = HttpCacheConfiguration{.memoryCapacity = memory,
+                                                .directory = directory / "http",
+                                                .files = files.get(),
+                                                .queue = cacheQueue,
+                                                .clock = &clock}};
     }
     ~CachingLoaderTest() override
     {

@@ -17,16 +17,34 @@ Result<Bytes> MemoryFiles::read(const fs::path& path, std::size_t maximumSize)
 {
     std::lock_guard lock(_mutex);
     if (const int error = faultOf("read", path)) return std::unexpected(Error::posix(error));
+    takeIn(path);
     const auto found = files.find(path);
     if (found == files.end()) return std::unexpected(Error::posix(directories.contains(path) ? EISDIR : ENOENT));
     if (found->second.size() > maximumSize) return std::unexpected(Error::posix(EFBIG));
     return Bytes(found->second);
 }
 
+/// Reads what was written by a handle.
+void MemoryFiles::takeIn(const fs::path& path)
+{
+    if (const auto written = _written.find(path); written != _written.end() && files.contains(path))
+        files[path] = readFile(written->second, SIZE_MAX)->view();
+}
+
 Result<void> MemoryFiles::writeAtomically(const fs::path& path, std::string_view contents)
 {
+    return write("write", path, contents);
+}
+
+Result<void> MemoryFiles::writeUnsynced(const fs::path& path, std::string_view contents)
+{
+    return write("unsynced", path, contents);
+}
+
+Result<void> MemoryFiles::write(std::string_view operation, const fs::path& path, std::string_view contents)
+{
     std::lock_guard lock(_mutex);
-    if (const int error = faultOf("write", path)) return std::unexpected(Error::posix(error));
+    if (const int error = faultOf(operation, path)) return std::unexpected(Error::posix(error));
     if (!directories.contains(path.parent_path())) return std::unexpected(Error::posix(ENOENT));
     if (directories.contains(path)) return std::unexpected(Error::posix(EISDIR));
     files[path] = contents;
@@ -37,6 +55,8 @@ Result<void> MemoryFiles::replace(const fs::path& path, const fs::path& source)
 {
     std::lock_guard lock(_mutex);
     if (const int error = faultOf("replace", path)) return std::unexpected(Error::posix(error));
+    takeIn(source);
+    _written.erase(source);
     if (!files.contains(source) || !directories.contains(path.parent_path()))
         return std::unexpected(Error::posix(ENOENT));
     if (directories.contains(path)) return std::unexpected(Error::posix(EISDIR));
@@ -44,11 +64,27 @@ Result<void> MemoryFiles::replace(const fs::path& path, const fs::path& source)
     return {};
 }
 
-Result<void> MemoryFiles::copy(const fs::path& path, const FileHandle& source)
+Result<void> MemoryFiles::copy(const fs::path& path, const FileHandle& source, std::uint64_t maximumSize)
 {
-    std::string contents(static_cast<std::size_t>(fileInfo(source)->size), '\0');
-    if (pread(source.fd(), contents.data(), contents.size(), 0) < 0) return std::unexpected(Error::posix(errno));
-    return writeAtomically(path, contents);
+    const auto contents = readFile(source, maximumSize);
+    if (!contents) return std::unexpected(contents.error());
+    return writeAtomically(path, contents->view());
+}
+
+Result<FileHandle> MemoryFiles::create(const fs::path& path)
+{
+    if (auto made = write("make", path, ""); !made) return std::unexpected(made.error());
+    std::lock_guard lock(_mutex);
+    const FileHandle& file = _written[path] = FileHandle(memfd_create("file", MFD_CLOEXEC));
+    return file.duplicate();
+}
+
+Result<void> MemoryFiles::sync(const fs::path& path)
+{
+    std::lock_guard lock(_mutex);
+    if (const int error = faultOf("sync", path)) return std::unexpected(Error::posix(error));
+    if (!files.contains(path)) return std::unexpected(Error::posix(ENOENT));
+    return {};
 }
 
 Result<void> MemoryFiles::createDirectories(const fs::path& path)
@@ -66,6 +102,7 @@ Result<FileInfo> MemoryFiles::info(const fs::path& path)
 {
     std::lock_guard lock(_mutex);
     if (const int error = faultOf("info", path)) return std::unexpected(Error::posix(error));
+    takeIn(path);
     if (directories.contains(path)) return FileInfo{.kind = FileInfo::Kind::Directory};
     if (!files.contains(path)) return std::unexpected(Error::posix(ENOENT));
     return FileInfo{.size = files[path].size(),
@@ -77,6 +114,16 @@ Result<void> MemoryFiles::remove(const fs::path& path)
     std::lock_guard lock(_mutex);
     if (const int error = faultOf("remove", path)) return std::unexpected(Error::posix(error));
     if (files.erase(path) == 0) return std::unexpected(Error::posix(ENOENT));
+    return {};
+}
+
+Result<void> MemoryFiles::removeDirectory(const fs::path& path)
+{
+    std::lock_guard lock(_mutex);
+    if (const int error = faultOf("remove", path)) return std::unexpected(Error::posix(error));
+    std::erase_if(files, [&](const auto& file) { return file.first.string().starts_with(path.string() + "/"); });
+    std::erase_if(directories,
+                  [&](const fs::path& each) { return each == path || each.string().starts_with(path.string() + "/"); });
     return {};
 }
 
@@ -98,7 +145,7 @@ Result<FileHandle> MemoryFiles::openForReading(const fs::path& path)
     auto contents = read(path, SIZE_MAX);
     if (!contents) return std::unexpected(contents.error());
     FileHandle handle(memfd_create("file", MFD_CLOEXEC));
-    if (write(handle.fd(), contents->data(), contents->size()) < 0) return std::unexpected(Error::posix(errno));
+    if (::write(handle.fd(), contents->data(), contents->size()) < 0) return std::unexpected(Error::posix(errno));
     lseek(handle.fd(), 0, SEEK_SET);
     return handle;
 }
@@ -107,6 +154,32 @@ Result<FileHandle> MemoryFiles::lock(const fs::path& path)
 {
     if (const int error = faultOf("lock", path)) return std::unexpected(Error::posix(error));
     return FileHandle(memfd_create("lock", MFD_CLOEXEC));
+}
+
+Result<FileHandle> MemoryFiles::takeDirectory(const fs::path& path)
+{
+    if (const int error = faultOf("take", path)) return std::unexpected(Error::posix(error));
+    std::lock_guard lock(_mutex);
+    for (fs::path each = path; each.has_relative_path(); each = each.parent_path()) directories.insert(each);
+    return FileHandle(memfd_create("lock", MFD_CLOEXEC));
+}
+
+Result<Sqlite> MemoryFiles::openDatabase(const fs::path& path, Sqlite::Access access)
+{
+    std::lock_guard lock(_mutex);
+    if (const int error = faultOf("database", path)) return std::unexpected(Error::posix(error));
+    if (!_databases) _databases.emplace("/dev/shm");
+    const fs::path real = _databases->path / path.relative_path();
+    fs::create_directories(real.parent_path());
+    const auto found = files.find(path);
+    if (found == files.end()) {
+        if (access == Sqlite::Access::ReadOnly) return std::unexpected(Error::posix(ENOENT));
+        for (const char* suffix : {"", "-wal", "-journal"}) fs::remove(real.string() + suffix);
+        files[path];
+    } else if (!found->second.empty()) {
+        writeFile(real, std::exchange(found->second, {}));
+    }
+    return Sqlite::open(real, access);
 }
 
 Result<FileHandle> MemoryFiles::createTemporary()

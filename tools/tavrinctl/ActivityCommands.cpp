@@ -107,7 +107,8 @@ void add(const Options& options, const ActivityOptions& mine)
                          .publiclyIndexable = mine.isPublic};
     if (!mine.identifier.empty()) activity.relatedUniqueIdentifier = mine.identifier;
     if (!mine.url.empty()) activity.contentUrl = mine.url;
-    if (const auto added = platform::AppActivities(directory()).add(activity, now()); !added)
+    const auto files = platform::makeSystemFiles();
+    if (const auto added = platform::AppActivities(*files, directory()).add(activity, now()); !added)
         throw Failure(fmt::format("the activity is not added: {}", added.error().reason()));
     if (options.json) return printJson(describe(activity));
     printLine(line(activity));
@@ -116,8 +117,9 @@ void add(const Options& options, const ActivityOptions& mine)
 
 void list(const Options& options)
 {
+    const auto files = platform::makeSystemFiles();
     auto activities =
-        platform::AppActivities(directory()).queryAppActivitiesAfterDate(Date::min(), Date::max(), SIZE_MAX);
+        platform::AppActivities(*files, directory()).queryAppActivitiesAfterDate(Date::min(), Date::max(), SIZE_MAX);
     if (!activities && activities.error().domain == platform::kPosixErrorDomain && activities.error().code == ENOENT)
         activities.emplace();
     if (!activities)
