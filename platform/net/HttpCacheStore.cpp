@@ -3,10 +3,11 @@
 #include <algorithm>
 #include <array>
 #include <charconv>
-#include <cstring>
 
 #include <fmt/format.h>
 #include <sqlite3.h>
+#define XXH_INLINE_ALL
+#include <xxhash.h>
 
 #include "platform/base/Log.h"
 
@@ -35,7 +36,7 @@ constexpr std::array kSchema{
     "CREATE INDEX entryByUse ON entry (used)",
     "CREATE TABLE answer (id INTEGER PRIMARY KEY, status INTEGER NOT NULL, url TEXT NOT NULL, headers TEXT NOT NULL,"
     " selecting TEXT NOT NULL, requested INTEGER NOT NULL, received INTEGER NOT NULL, bodySize INTEGER NOT NULL,"
-    " digest INTEGER NOT NULL, body TEXT)"};
+    " xxh3 INTEGER NOT NULL, body TEXT)"};
 
 /// Header fields as lines; one with a line end in it can't have come by HTTP, and is left out.
 std::string linesOf(const HttpHeaders& headers)
@@ -60,39 +61,12 @@ HttpHeaders headersOf(std::string_view lines)
     return headers;
 }
 
-/// Sees damage, such as pages that never came to the disk; no defence against someone who means harm. Every step maps
-/// different states to different ones, so that no single change is lost; eight at a time, for one waits for its last.
-class Digest {
-public:
-    void add(std::string_view bytes)
-    {
-        auto lanes = _lanes; // in registers
-        step(lanes[0], bytes.size());
-        for (; bytes.size() >= kBlock; bytes.remove_prefix(kBlock))
-            for (std::size_t i = 0; i < lanes.size(); ++i) {
-                std::uint64_t word = 0;
-                std::memcpy(&word, bytes.data() + i * sizeof word, sizeof word);
-                step(lanes[i], word);
-            }
-        for (const char c : bytes) step(lanes[1], static_cast<unsigned char>(c));
-        _lanes = lanes;
-    }
-    void add(std::int64_t number) { step(_lanes[2], static_cast<std::uint64_t>(number)); }
-    [[nodiscard]] std::int64_t value() const
-    {
-        std::uint64_t all = 0;
-        for (const std::uint64_t lane : _lanes) {
-            step(all, lane);
-            all ^= all >> 32;
-        }
-        return static_cast<std::int64_t>(all);
-    }
-
-private:
-    static void step(std::uint64_t& lane, std::uint64_t word) { lane = (lane ^ word) * 0x9e3779b97f4a7c15; }
-    std::array<std::uint64_t, 8> _lanes{1, 2, 3, 4, 5, 6, 7, 8};
-    static constexpr std::size_t kBlock = 64;
-};
+/// Goes on from the digest of what came before. It sees damage, such as pages that never came to the disk; it is no
+/// defence against someone who means harm.
+std::uint64_t digestOf(std::string_view bytes, std::uint64_t before)
+{
+    return XXH3_64bits_withSeed(bytes.data(), bytes.size(), before);
+}
 
 std::int64_t countOf(Date date)
 {
@@ -131,11 +105,13 @@ struct HttpCacheStore::Row {
 
     [[nodiscard]] std::int64_t digestWith(const std::string& key, std::string_view bytes) const
     {
-        Digest all;
-        for (const std::string* text : {&key, &url, &headers, &selecting}) all.add(*text);
-        for (const std::int64_t number : {status, requested, received}) all.add(number);
-        all.add(bytes);
-        return all.value();
+        const std::array numbers{status, requested, received};
+        std::uint64_t digest =
+            digestOf({reinterpret_cast<const char*>(numbers.data()), sizeof numbers}, numbers.size());
+        for (const std::string_view text : {std::string_view(key), std::string_view(url), std::string_view(headers),
+                                            std::string_view(selecting), bytes})
+            digest = digestOf(text, digest);
+        return static_cast<std::int64_t>(digest);
     }
 };
 
@@ -249,7 +225,7 @@ Result<std::shared_ptr<const StoredResponse>> HttpCacheStore::find(const std::st
 {
     std::optional<Row> row;
     auto read =
-        _index->run("SELECT answer.id, status, url, headers, selecting, requested, received, bodySize, digest, body"
+        _index->run("SELECT answer.id, status, url, headers, selecting, requested, received, bodySize, xxh3, body"
                     " FROM entry JOIN answer ON answer.id = entry.id WHERE key = ?",
                     {std::string_view(key)}, [&](const Sqlite::Row& found) {
                         const auto text = [&](int column) { return std::string(found.text(column)); };
