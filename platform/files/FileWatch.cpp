@@ -1,25 +1,56 @@
 #include "platform/files/FileWatch.h"
 
-#include <array>
-#include <cerrno>
-#include <sys/epoll.h>
+#include <cstring>
 #include <sys/inotify.h>
-#include <unistd.h>
 
-#include "platform/files/Files.h"
+#include <systemd/sd-event.h>
+
+#include "platform/base/Log.h"
 #include "platform/run/RunLoop.h"
 
 namespace platform {
 
 namespace fs = std::filesystem;
 
+namespace {
+
+constexpr std::uint32_t kChanges =
+    IN_CREATE | IN_CLOSE_WRITE | IN_MOVED_TO | IN_MOVED_FROM | IN_DELETE | IN_DELETE_SELF | IN_MOVE_SELF | IN_ONLYDIR;
+constexpr std::uint32_t kLosses = IN_DELETE_SELF | IN_MOVE_SELF | IN_IGNORED | IN_UNMOUNT;
+
+} // namespace
+
+/// The loop shares one inotify instance among all its sources. What it sees is noted, and looked at once when no
+/// further event waits.
 struct FileWatch::Impl {
+    Impl(sd_event* loop_, fs::path path_, std::function<void()> changed_)
+        : loop(loop_), path(std::move(path_)), changed(std::move(changed_))
+    {
+        const auto look = [](sd_event_source*, void* self) {
+            static_cast<Impl*>(self)->look();
+            return 0;
+        };
+        if (sd_event_add_defer(loop, &later, look, this) < 0) return; // out of memory
+        sd_event_source_set_enabled(later, SD_EVENT_OFF);
+        sd_event_source_set_priority(later, SD_EVENT_PRIORITY_NORMAL + 1); // behind the events that wait
+        aim();
+    }
+    ~Impl()
+    {
+        sd_event_source_disable_unref(events);
+        sd_event_source_disable_unref(later);
+    }
+
+    sd_event* loop;
     fs::path path;
     std::function<void()> changed;
-    FileHandle inotify{inotify_init1(IN_CLOEXEC | IN_NONBLOCK)};
-    int directory = -1; // inotify's number for the directory that is watched
-    fs::path watched;   // that directory
-    std::unique_ptr<RunLoop::Watch> watch;
+    fs::path watched;                  // the directory
+    sd_event_source* events = nullptr; // of that directory
+    sd_event_source* later = nullptr;
+    // Seen since the last look.
+    bool mine = false;
+    bool elsewhere = false;
+    bool lost = false; // the directory was removed or moved, and perhaps another is in its place by now
 
     [[nodiscard]] fs::path folder() const { return path.parent_path(); }
 
@@ -32,67 +63,56 @@ struct FileWatch::Impl {
         return found;
     }
 
-    /// Watches that one. Looks again once it does, for what was made in between.
+    /// Watches that one. Looks again afterwards, for what was made in between.
     void aim()
     {
         for (fs::path next = nearest(); next != watched; next = nearest()) {
             letGo();
             watched = next;
-            directory = inotify_add_watch(inotify.fd(), next.c_str(),
-                                          IN_CREATE | IN_CLOSE_WRITE | IN_MOVED_TO | IN_MOVED_FROM | IN_DELETE |
-                                              IN_DELETE_SELF | IN_MOVE_SELF | IN_ONLYDIR);
+            const auto note = [](sd_event_source*, const inotify_event* event, void* self) {
+                static_cast<Impl*>(self)->note(*event);
+                return 0;
+            };
+            if (const int added = sd_event_add_inotify(loop, &events, next.c_str(), kChanges, note, this); added < 0)
+                defaultLog().error("changes of {} go unseen: {}", path.string(), std::strerror(-added));
         }
     }
 
     void letGo()
     {
-        if (directory >= 0) inotify_rm_watch(inotify.fd(), directory);
-        directory = -1;
+        events = sd_event_source_disable_unref(events);
         watched.clear();
     }
 
-    void readEvents()
+    void note(const inotify_event& event)
     {
-        alignas(inotify_event) std::array<char, 4096> buffer;
-        bool mine = false;
-        bool elsewhere = false;
-        bool lost = false; // the directory: removed, or moved, and perhaps another is in its place by now
-        ssize_t size = 0;
-        while ((size = read(inotify.fd(), buffer.data(), buffer.size())) > 0) {
-            const inotify_event* event = nullptr;
-            for (ssize_t at = 0; at < size; at += static_cast<ssize_t>(sizeof(inotify_event) + event->len)) {
-                event = reinterpret_cast<const inotify_event*>(buffer.data() + at);
-                if ((event->mask & IN_Q_OVERFLOW) != 0)
-                    mine = true;
-                else if (event->wd != directory)
-                    continue; // it is still told of an earlier one
-                else if ((event->mask & (IN_DELETE_SELF | IN_MOVE_SELF | IN_IGNORED | IN_UNMOUNT)) != 0)
-                    lost = true;
-                else if (event->len > 0 && (path.has_filename() ? watched / event->name == path : watched == folder()))
-                    mine = true;
-                else if (event->len == 0 || watched != folder())
-                    elsewhere = true;
-            }
-        }
+        if ((event.mask & IN_Q_OVERFLOW) != 0)
+            mine = true;
+        else if ((event.mask & kLosses) != 0)
+            lost = true;
+        else if (event.len > 0 && (path.has_filename() ? watched / event.name == path : watched == folder()))
+            mine = true;
+        else if (event.len == 0 || watched != folder())
+            elsewhere = true;
+        if (mine || elsewhere || lost) sd_event_source_set_enabled(later, SD_EVENT_ONESHOT);
+    }
+
+    void look()
+    {
         if (elsewhere || lost) {
             const fs::path before = watched;
             if (lost) letGo();
             aim();
             mine = mine || ((lost || before != watched) && (before == folder() || watched == folder()));
         }
-        if (mine) changed();
+        elsewhere = lost = false;
+        if (std::exchange(mine, false)) changed();
     }
 };
 
-FileWatch::FileWatch(RunLoop& runLoop, fs::path path, std::function<void()> changed) : _impl(std::make_unique<Impl>())
-{
-    _impl->path = std::move(path);
-    _impl->changed = std::move(changed);
-    if (!_impl->inotify) return; // out of instances: changes go unseen
-    _impl->aim();
-    _impl->watch =
-        runLoop.watch(_impl->inotify.fd(), EPOLLIN, [impl = _impl.get()](std::uint32_t) { impl->readEvents(); });
-}
+FileWatch::FileWatch(RunLoop& runLoop, fs::path path, std::function<void()> changed)
+    : _impl(std::make_unique<Impl>(runLoop.handle(), std::move(path), std::move(changed)))
+{}
 
 FileWatch::~FileWatch() = default;
 

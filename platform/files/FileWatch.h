@@ -9,10 +9,11 @@ namespace platform {
 class RunLoop;
 
 /// Watches one path by inotify, so that it is seen when the file is made, written, replaced or removed. The directory
-/// is watched, not the file; where it is missing, its nearest parent is, until it is made. A path that ends in "/"
-/// stands for everything that is directly in that directory.
+/// is watched, not the file; while that is missing, its nearest parent is. A path that ends in "/" stands for
+/// everything that is directly in that directory.
 ///
-/// Made and destroyed on the run loop's thread; `changed` is called there, once for a burst of changes.
+/// All watches of a run loop share one inotify instance. If the system has none left, a line is logged and changes go
+/// unseen. Made and destroyed on the run loop's thread; `changed` is called there, once for a burst of changes.
 class FileWatch {
 public:
     FileWatch(RunLoop& runLoop, std::filesystem::path path, std::function<void()> changed);

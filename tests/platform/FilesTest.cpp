@@ -4,13 +4,16 @@
 #include <fcntl.h>
 #include <map>
 #include <optional>
+#include <sys/resource.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <gtest/gtest.h>
 
+#include "platform/files/FileWatch.h"
 #include "tests/support/FullDisk.h"
 #include "tests/support/TemporaryDirectory.h"
+#include "tests/support/TestDevice.h"
 
 namespace platform {
 namespace {
@@ -139,6 +142,26 @@ TEST_F(FilesTest, ALockIsHeldByOneHandleAtATime)
     EXPECT_EQ(failure(files->lock(directory / "no/lock")), ENOENT);
 }
 
+TEST_F(FilesTest, ADirectoryIsTakenByOneHandleAtATime)
+{
+    fs::create_directory(directory / "open");
+    fs::permissions(directory / "open", fs::perms(0755));
+    auto taken = files->takeDirectory(directory / "open");
+    EXPECT_TRUE(taken);
+    EXPECT_EQ(mode(directory / "open"), 0700u);
+    EXPECT_EQ(failure(files->takeDirectory(directory / "open")), EWOULDBLOCK);
+    taken = FileHandle();
+    EXPECT_TRUE(files->takeDirectory(directory / "open"));
+    EXPECT_TRUE(files->takeDirectory(directory / "made/below"));
+    fs::create_symlink(directory / "open", directory / "link");
+    writeFile(directory / "file", "x");
+    for (const char* name : {"link", "file"})
+        EXPECT_EQ(failure(files->takeDirectory(directory / name)), ENOTDIR) << name;
+    EXPECT_TRUE(files->removeDirectory(directory / "made"));
+    EXPECT_FALSE(fs::exists(directory / "made"));
+    EXPECT_TRUE(files->removeDirectory(directory / "none"));
+}
+
 TEST_F(FilesTest, AReplacedFileIsTheOldOrTheNewAlsoAcrossFileSystems)
 {
     const test::TemporaryDirectory memory("/dev/shm");
@@ -162,6 +185,11 @@ TEST_F(FilesTest, AReplacedFileIsTheOldOrTheNewAlsoAcrossFileSystems)
     EXPECT_TRUE(files->copy(directory / "copy", *open));
     EXPECT_TRUE(files->copy(directory / "copy", *open)) << "from its beginning";
     EXPECT_EQ(contents(directory / "copy"), std::string(200'000, 'n'));
+    EXPECT_TRUE(files->copy(directory / "copy", *open, 200'000));
+    EXPECT_EQ(failure(files->copy(directory / "copy", *open, 199'999)), EFBIG);
+    EXPECT_EQ(readFile(*open, 200'000)->view(), contents(directory / "copy"));
+    EXPECT_EQ(mapFile(*open, 9)->view(), "nnnnnnnnn");
+    EXPECT_EQ(failure(readFile(*open, 199'999)), EFBIG);
     EXPECT_EQ(fileInfo(*open)->size, 200'000u);
     fs::remove(directory / "copy");
 
@@ -196,6 +224,54 @@ TEST_F(FilesTest, TellsWhatThereIs)
     EXPECT_TRUE(files->remove(directory / "link"));
     EXPECT_EQ(contents(directory / "file"), "1234");
     EXPECT_EQ(failure(files->remove(directory / "link")), ENOENT);
+}
+
+TEST_F(FilesTest, ADateThatNoClockHoldsIsClamped)
+{
+    writeFile(directory / "file", "");
+    for (const std::int64_t seconds : {INT64_C(10'000'000'000), INT64_C(-10'000'000'000)}) {
+        const timespec times[2]{{seconds, 0}, {seconds, 0}};
+        ASSERT_EQ(utimensat(AT_FDCWD, (directory / "file").c_str(), times, 0), 0);
+        EXPECT_EQ(secondsSince1970(files->info(directory / "file")->modified) > 0, seconds > 0) << seconds;
+    }
+}
+
+/// How many inotify instances this process has.
+int inotifyInstances()
+{
+    int found = 0;
+    std::error_code gone;
+    for (const auto& entry : fs::directory_iterator("/proc/self/fd"))
+        found += fs::read_symlink(entry, gone).string().contains("inotify");
+    return found;
+}
+
+TEST_F(FilesTest, WatchesShareOneInotifyInstanceAndSayWhenThereIsNone)
+{
+    RunLoop loop;
+    int seen = 0;
+    std::vector<std::unique_ptr<FileWatch>> watches;
+    const auto watch = [&](const char* name) {
+        watches.push_back(std::make_unique<FileWatch>(loop, directory / name, [&] { ++seen; }));
+    };
+    rlimit before{};
+    ASSERT_EQ(getrlimit(RLIMIT_NOFILE, &before), 0);
+    rlimit none = before;
+    none.rlim_cur = 0;
+    const test::LogCapture log;
+    ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &none), 0);
+    watch("unseen");
+    setrlimit(RLIMIT_NOFILE, &before);
+    EXPECT_EQ(log.count("unseen go unseen"), 1);
+    for (const char* name : {"a", "b", "later/c"}) watch(name);
+    EXPECT_EQ(inotifyInstances(), 1);
+    for (const char* name : {"a", "b", "other", "unseen"}) writeFile(directory / name, "x");
+    EXPECT_TRUE(test::runUntil(loop, [&] { return seen >= 2; }));
+    fs::create_directory(directory / "later");
+    writeFile(directory / "later/c", "x");
+    EXPECT_TRUE(test::runUntil(loop, [&] { return seen >= 3; }));
+    loop.runOnce(std::chrono::nanoseconds(0));
+    EXPECT_EQ(seen, 3) << "each once";
 }
 
 /// Sets or unsets variables, and puts them back.
