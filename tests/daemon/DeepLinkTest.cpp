@@ -11,7 +11,6 @@
 #include "tavrind/TavrinDPPeriodicTask.h"
 #include "tavrind/TavrinDPPeriodicTaskManager.h"
 #include "tests/support/DaemonFixture.h"
-#include "tests/support/TemporaryDirectory.h"
 
 namespace tavrin {
 namespace {
@@ -206,18 +205,15 @@ TEST_F(PeriodicTaskTest, IsForgottenWhenUnregistered)
 }
 
 struct DeepLinkIngesterTest : test::DaemonTest {
-    DeepLinkIngesterTest()
-    {
-        device.device.directories.data = data.path;
-        start();
-    }
+    DeepLinkIngesterTest() { start(); }
     void add(std::string app, std::string url, platform::Duration before = 1h, bool isPublic = true)
     {
         const AppActivity activity{.start = device.clock.wallNow() - before,
                                    .bundleIdentifier = std::move(app),
                                    .contentUrl = std::move(url),
                                    .publiclyIndexable = isPublic};
-        ASSERT_TRUE(platform::AppActivities(database.parent_path()).add(activity, device.clock.wallNow()));
+        ASSERT_TRUE(
+            platform::AppActivities(device.files, database.parent_path()).add(activity, device.clock.wallNow()));
     }
     void list(const char* resource, std::string contents)
     {
@@ -243,8 +239,7 @@ struct DeepLinkIngesterTest : test::DaemonTest {
         return text;
     }
 
-    platform::test::TemporaryDirectory data;
-    const std::filesystem::path database = data / "com.quorvane.tavrind/knowledge/app-activities.db";
+    const std::filesystem::path database = "/data/com.quorvane.tavrind/knowledge/app-activities.db";
     const std::filesystem::path resources = "/caches/com.quorvane.tavrind";
     LogCapture log;
     static constexpr const char* kWhitelist = R"({"static_apps_whitelist": ["org.allowed", 7]})";
@@ -333,8 +328,7 @@ TEST_F(DeepLinkIngesterTest, WithoutASoundDatabaseThereIsNothingToTell)
     run();
     EXPECT_EQ(log.count("no app activities"), 1);
     EXPECT_EQ(counters(), "0 0 0 0 0 0 0 0 0 0 1 ");
-    std::filesystem::create_directories(database.parent_path());
-    platform::test::writeFile(database, "no database, but long enough to be looked at as if it were one");
+    device.files.files[database] = "no database, but long enough to be looked at as if it were one";
     run();
     EXPECT_EQ(log.count("no app activities"), 2);
     EXPECT_EQ(counters(), "0 0 0 0 0 0 0 0 0 0 2 ");

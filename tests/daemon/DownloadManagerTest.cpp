@@ -83,14 +83,15 @@ struct DownloadManagerTest : testing::Test {
         device.drain();
     }
 
-    auto& tasks() { return device.background.sessions.at("com.quorvane.tavrind")->tasks; }
+    auto& tasks() { return device.background.loads.at("com.quorvane.tavrind")->tasks; }
     /// Another process, whose session takes up what is under way.
     void restart()
     {
-        const auto task = tasks().back();
+        assembly.downloadURLSession.reset();
+        assembly.downloadManager.reset();
+        manager.reset();
+        device.drain();
         makeManager();
-        tasks().push_back(task);
-        device.background.sessions.at("com.quorvane.tavrind")->adopt(*task);
     }
 
     void bag(Dictionary resources)
@@ -110,7 +111,7 @@ struct DownloadManagerTest : testing::Test {
     }
     void deliver(int status, std::string contents, std::optional<Url> from = {})
     {
-        tasks().back()->deliver(status, std::move(contents), std::move(from));
+        tasks().back()->respond(status, std::move(contents), {}, std::move(from));
         device.drain();
     }
     std::string header(const platform::UrlRequest& request, std::string_view name)
@@ -190,7 +191,7 @@ TEST_F(DownloadManagerTest, WhatFailsLeavesTheOldFileAndIsTriedAgainWithTheNextB
 {
     download("TAVQIFeatures", "https://r.example/f?version=1");
     deliver(200, "old");
-    const platform::Error cut("UrlErrorDomain", platform::kUrlConnectionLost);
+    const platform::Error endless(std::string(platform::kUrlErrorDomain), platform::kUrlTooLarge);
     const struct {
         const char* what;
         std::function<void()> happens;
@@ -198,7 +199,7 @@ TEST_F(DownloadManagerTest, WhatFailsLeavesTheOldFileAndIsTriedAgainWithTheNextB
     } cases[]{
         {"not there", [&] { deliver(404, "sorry"); }, "status code 404"},
         {"server error", [&] { deliver(500, ""); }, "status code 500"},
-        {"cut off", [&] { tasks().back()->fail(cut); }, "download error"},
+        {"too large", [&] { tasks().back()->fail(endless); }, "download error"},
         {"disk full",
          [&] {
              device.files.fault = [](auto operation, auto&) { return operation == "replace" ? ENOSPC : 0; };
@@ -344,6 +345,44 @@ TEST_F(DownloadManagerTest, LookupHintsFollowTheBagTheirRedirectAndTheLocation)
     EXPECT_EQ(header(third->originalRequest(), "If-None-Match"), "") << "another place has other hints";
 }
 
+TEST_F(DownloadManagerTest, NothingOvertakesABagThatWaitsForTheListOfDownloads)
+{
+    struct SlowSession final : platform::BackgroundSession {
+        platform::Result<std::shared_ptr<platform::BackgroundTask>> uploadTask(platform::UrlRequest,
+                                                                               const std::filesystem::path&) override
+        {
+            return nullptr;
+        }
+        platform::Result<std::shared_ptr<platform::BackgroundTask>> downloadTask(platform::UrlRequest) override
+        {
+            return nullptr;
+        }
+        void getTasks(
+            std::move_only_function<void(std::vector<std::shared_ptr<platform::BackgroundTask>>)> callback) override
+        {
+            answers.push_back(std::move(callback));
+        }
+        std::vector<std::move_only_function<void(std::vector<std::shared_ptr<platform::BackgroundTask>>)>> answers;
+    };
+    const auto slow = std::make_shared<SlowSession>();
+    assembly.downloadURLSession = slow;
+    const std::string hints = "TAVLookupHintsWeekly";
+    bag({{hints, "https://r.example/hints"}});
+    device.notifications.post({.name = TAVSignificantLocationChange});
+    device.drain();
+    EXPECT_EQ(log.count("deleting resource: " + hints), 0);
+    EXPECT_TRUE(manager->resourceVersions().empty()) << "readers don't wait";
+    ASSERT_EQ(slow->answers.size(), 1u);
+    slow->answers[0]({});
+    device.drain();
+    EXPECT_EQ(log.count("deleting resource: " + hints), 1);
+    EXPECT_FALSE(manager->resourceForKey(hints)) << "the bag's resource was there first";
+
+    bag({{hints, "https://r.example/hints"}});
+    device.advance(60s);
+    EXPECT_TRUE(manager->resourceForKey(hints)) << "a list that never comes isn't waited for for ever";
+}
+
 TEST_F(DownloadManagerTest, ADownloadOutlivesTheProcess)
 {
     download("TAVQIFeatures", "https://r.example/f?version=7");
@@ -351,7 +390,7 @@ TEST_F(DownloadManagerTest, ADownloadOutlivesTheProcess)
     deliver(200, "seven");
     EXPECT_EQ(contents("TAVQIFeatures"), "seven");
     EXPECT_EQ(manager->resourceVersions(), (Dictionary{{"TAVQIFeatures", "7"}}));
-    makeManager();
+    restart();
     EXPECT_EQ(manager->resourceVersions(), (Dictionary{{"TAVQIFeatures", "7"}})) << "before the first bag";
 }
 

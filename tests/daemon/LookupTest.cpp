@@ -29,9 +29,9 @@ struct LookupTest : DaemonTest {
     }
     void deliver(std::string contents, std::string_view from)
     {
-        device.background.sessions.at("com.quorvane.tavrind")
+        device.background.loads.at("com.quorvane.tavrind")
             ->tasks.back()
-            ->deliver(200, std::move(contents), Url::parse(from));
+            ->respond(200, std::move(contents), {}, Url::parse(from));
         device.drain();
         assembly().lookup->_drainQueue();
     }

@@ -55,7 +55,7 @@ TEST_F(UploadTest, WhatTheServiceGets)
         << "the bag's own query is replaced";
     EXPECT_EQ(request.url.queryValue("v"), "2");
     EXPECT_EQ(request.timeout, platform::Duration(300s));
-    const auto text = tools::inflateRaw(task->body, 1u << 20).value();
+    const auto text = tools::inflateRaw(bodyOf(*task), 1u << 20).value();
     ASSERT_TRUE(request.headers.find("X-Quorvane-Digest"));
     EXPECT_EQ(*request.headers.find("X-Quorvane-Digest"), sha512(text));
 
@@ -83,9 +83,12 @@ TEST_F(UploadTest, EndsAreCounted)
     device.drain();
     EXPECT_EQ(counter("feedbacksent") - sent, 7) << "top-level keys are what is counted";
     uploadOne()->respond(500);
-    uploadOne()->fail(fail(platform::kUrlTimedOut));
     uploadOne()->fail(fail(platform::kUrlTooLarge));
     device.drain();
+    uploadOne()->fail(fail(platform::kUrlConnectionLost));
+    device.drain();
+    EXPECT_EQ(counter("feedbacknotsent"), 14) << "it is tried again";
+    device.advance(7 * 24h);
     EXPECT_EQ(counter("feedbacksent") - sent, 7);
     EXPECT_EQ(counter("feedbacknotsent"), 21);
     EXPECT_EQ(counter("fbrequesttimedout"), 1);
@@ -130,15 +133,11 @@ TEST_F(UploadTest, AnUploadOfAnEarlierProcessIsCountedAtItsEnd)
     report("ZRCustomFeedback", {{"feedbackType", 2}, {"jsonFeedback", Dictionary()}});
     uploadOne();
     uploadOne();
-    const auto earlier = uploads();
-    ASSERT_EQ(earlier.size(), 3u);
+    ASSERT_EQ(uploads().size(), 3u);
     restart();
     const std::int64_t sent = counter("feedbacksent");
-    for (const auto& task : earlier)
-        device.background.sessions.at("com.quorvane.tavrind.flusher.nsurlsession")->adopt(*task);
-    earlier[0]->respond(200);
-    earlier[1]->respond(200);
-    earlier[2]->respond(503);
+    ASSERT_EQ(uploads().size(), 3u) << "taken up";
+    for (std::size_t i = 0; i < 3; ++i) uploads()[i]->respond(i < 2 ? 200 : 503);
     device.drain();
     EXPECT_EQ(counter("feedbacksent") - sent, 7) << "not what the other flusher sent";
     EXPECT_EQ(counter("feedbacknotsent"), 7);
@@ -360,10 +359,13 @@ TEST_F(UploadTest, AThousandClientsComeAndGo)
 TEST_F(UploadTest, AnUploadThatCannotBeMadeIsDropped)
 {
     begin();
-    device.background.sessions.at("com.quorvane.tavrind.flusher.nsurlsession")->refuse = true;
+    device.files.fault = [](std::string_view operation, const std::filesystem::path& path) {
+        return operation == "write" && path.extension() == ".body" ? ENOSPC : 0;
+    };
     appear();
     flushSession();
     upload();
+    device.files.fault = {};
     EXPECT_EQ(booked(FeedbackFate::NoTask), 2);
     expectBooksClose();
 }

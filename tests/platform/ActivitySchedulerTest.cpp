@@ -5,7 +5,7 @@
 
 #include "platform/device/ActivityPolicy.h"
 #include "platform/device/DeviceUseLogind.h"
-#include "tests/support/FakeBackground.h"
+#include "tests/support/FakeActivities.h"
 #include "tests/support/ManualClock.h"
 #include "tests/support/ManualExecutor.h"
 #include "tests/support/MemoryFiles.h"

@@ -28,14 +28,15 @@ public:
         [[nodiscard]] const UrlRequest& originalRequest() const override { return _request; }
         [[nodiscard]] Value timingData() const override { return timing; }
 
-        /// The body of a transfer goes into its file.
-        void respond(int status, std::string body, HttpHeaders headers = {})
+        /// The body of a transfer goes into its file. The answer comes from where redirects led.
+        void respond(int status, std::string body = "", HttpHeaders headers = {}, std::optional<Url> from = {})
         {
             if (files.download) {
                 if (pwrite(files.download.fd(), body.data(), body.size(), 0) < 0) std::abort();
                 body.clear();
             }
-            finish(Bytes(std::move(body)), UrlResponse{_request.url, true, status, std::move(headers)}, std::nullopt);
+            finish(Bytes(std::move(body)), UrlResponse{from.value_or(_request.url), true, status, std::move(headers)},
+                   std::nullopt);
         }
         void fail(Error error) { finish(std::nullopt, std::nullopt, std::move(error)); }
         void finish(std::optional<Bytes> data, std::optional<UrlResponse> response, std::optional<Error> error)

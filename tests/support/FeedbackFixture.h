@@ -60,10 +60,10 @@ struct FeedbackTest : DaemonTest {
         device.activities.run("com.quorvane.tavrind.flusher.background");
         device.drain();
     }
-    using UploadTask = platform::test::FakeBackgroundSessions::Task;
+    using UploadTask = platform::test::FakeUrlLoader::Task;
     std::vector<std::shared_ptr<UploadTask>>& allUploads()
     {
-        return device.background.sessions.at("com.quorvane.tavrind.flusher.nsurlsession")->tasks;
+        return device.background.loads.at("com.quorvane.tavrind.flusher.nsurlsession")->tasks;
     }
     /// Those since the daemon began, or was restarted.
     std::vector<std::shared_ptr<UploadTask>> uploads()
@@ -71,10 +71,14 @@ struct FeedbackTest : DaemonTest {
         const auto& all = allUploads();
         return {all.begin() + static_cast<std::ptrdiff_t>(_uploadsBefore), all.end()};
     }
+    static std::string bodyOf(const UploadTask& task)
+    {
+        return std::string(platform::readFile(task.files.upload, SIZE_MAX)->view());
+    }
     /// An upload's JSON.
     static Value decoded(const UploadTask& task)
     {
-        const auto text = tools::inflateRaw(task.body, 64u << 20);
+        const auto text = tools::inflateRaw(bodyOf(task), 64u << 20);
         return text ? platform::parseJson(*text).value_or(Value()) : Value();
     }
     /// The types of an upload's events, in order.

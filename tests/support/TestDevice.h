@@ -20,7 +20,8 @@
 #include "platform/net/NetworkStatus.h"
 #include "platform/run/NotificationCenter.h"
 #include "platform/run/Transactions.h"
-#include "tests/support/FakeBackground.h"
+#include "tests/support/BackgroundLoads.h"
+#include "tests/support/FakeActivities.h"
 #include "tests/support/FakeIpc.h"
 #include "tests/support/FakeUrlLoader.h"
 #include "tests/support/ManualClock.h"
@@ -207,7 +208,7 @@ struct TestDevice {
     FakeNotifier notifier;
     FakeUrlLoader loader;
     NetworkStatus network; ///< nothing is known until a test sets it
-    FakeBackgroundSessions background{files};
+    BackgroundLoads background{files, clock, executor};
     FakeActivityScheduler activities;
     FakeTransport ipc{executor, clock};
     Device device{.clock = clock,
