@@ -1,20 +1,33 @@
 #include "tavrind/mmap_file.h"
 
 #include <cerrno>
-#include <sys/mman.h>
-#include <sys/stat.h>
+#include <fcntl.h>
 
 namespace tavrin {
 
+namespace {
+
+/// Twice what the longest resource, and many times what an image or a session, may have.
+constexpr std::size_t kLargest = 64u << 20;
+
+/// Only a file of memfd_create has seals.
+bool isInMemory(const platform::FileHandle& file)
+{
+    return fcntl(file.fd(), F_GET_SEALS) >= 0;
+}
+
+} // namespace
+
 platform::Result<platform::Bytes> mmapFileHandle(const platform::FileHandle& file)
 {
-    struct stat status{};
-    if (fstat(file.fd(), &status) != 0) return std::unexpected(platform::Error::posix(errno));
-    const auto size = static_cast<std::size_t>(status.st_size);
-    void* address = mmap(nullptr, size, PROT_READ, MAP_PRIVATE, file.fd(), 0);
-    if (address == MAP_FAILED) return std::unexpected(platform::Error::posix(errno));
-    const std::shared_ptr<const void> owner(address, [size](void* mapped) { munmap(mapped, size); });
-    return platform::Bytes(owner, {static_cast<const char*>(address), size});
+    const auto info = platform::fileInfo(file);
+    if (!info) return std::unexpected(info.error());
+    if (info->size == 0) return std::unexpected(platform::Error::posix(EINVAL));
+    if (info->size > kLargest) return std::unexpected(platform::Error::posix(EFBIG));
+    if (isInMemory(file)) return platform::mapFile(file, info->size);
+    auto contents = platform::readFile(file, kLargest);
+    if (contents && contents->size() < info->size) return std::unexpected(platform::Error::posix(EIO));
+    return contents;
 }
 
 } // namespace tavrin

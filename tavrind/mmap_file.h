@@ -5,10 +5,11 @@
 
 namespace tavrin {
 
-/// Maps a whole file, read-only and private; the last copy of the bytes unmaps it. The handle may be closed at once. An
-/// error of the system's ("POSIX") where it can't be mapped: an empty file (EINVAL), say.
+/// Returns the bytes of a whole file. The handle may be closed at once. Fails with the system's error ("POSIX"): EINVAL
+/// for an empty file, EFBIG for one of more than 64 MiB, EIO for one that became shorter meanwhile.
 ///
-/// Only for files that are replaced, never cut short, while they are in use: reading beyond a new end is fatal.
+/// A nameless file in memory is mapped. Any other file is read: reading a mapping beyond the end of a file that another
+/// program cut short would kill the process.
 [[nodiscard]] platform::Result<platform::Bytes> mmapFileHandle(const platform::FileHandle& file);
 
 } // namespace tavrin

@@ -16,6 +16,7 @@
 #include "tavrind/DownloadManager.h"
 #include "tavrind/encoder.h"
 #include "tavrind/mmap_file.h"
+#include "tests/support/TemporaryDirectory.h"
 #include "tests/support/TestDevice.h"
 
 namespace tavrin {
@@ -204,7 +205,7 @@ TEST(AppWhitelist, GivesNoSignatureForWhatIsNoListOrNamesNothingInstalled)
         EXPECT_FALSE(processWhitelist(listOf(inner.substr(0, length)), device.applications)) << "cut at " << length;
 
     const platform::FileHandle huge(memfd_create("list", MFD_CLOEXEC));
-    ASSERT_EQ(ftruncate(huge.fd(), off_t{1} << 30), 0);
+    ASSERT_EQ(ftruncate(huge.fd(), off_t{40} << 20), 0);
     device.applications.readings = 0;
     const platform::test::LogCapture log;
     EXPECT_FALSE(processWhitelist(mmapFileHandle(huge)->view(), device.applications));
@@ -253,9 +254,22 @@ TEST(MappedFile, OutlivesItsHandleAndAnEmptyOneIsAnError)
     EXPECT_EQ(mmapFileHandle(file).error().code, EINVAL);
     ASSERT_EQ(write(file.fd(), "mapped", 6), 6);
     const auto bytes = mmapFileHandle(file);
+    ASSERT_EQ(ftruncate(file.fd(), off_t{65} << 20), 0);
+    EXPECT_EQ(mmapFileHandle(file).error().code, EFBIG);
     file = {};
     EXPECT_EQ(bytes->view(), "mapped");
     EXPECT_EQ(mmapFileHandle(file).error().code, EBADF);
+}
+
+/// A mapping would end the process here.
+TEST(MappedFile, AFileThatAnotherProgramCutsShortStaysReadable)
+{
+    const platform::test::TemporaryDirectory directory;
+    const std::string list(100'000, 'x');
+    platform::test::writeFile(directory / "list", list);
+    const auto bytes = mmapFileHandle(*platform::makeSystemFiles()->openForReading(directory / "list"));
+    std::filesystem::resize_file(directory / "list", 0);
+    EXPECT_EQ(bytes->view(), list);
 }
 
 } // namespace
