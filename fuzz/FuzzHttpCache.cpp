@@ -75,7 +75,7 @@ void use(const fs::path& directory)
         const auto found = (*store)->find(key);
         if (found && *found)
             check((*found)->body == answerFor(key, size).body && (*found)->response.headers.size() == 2, key);
-        if (!found && HttpCacheStore::isDamage(found.error())) check((*store)->beginAnew().has_value());
+        if (!found && Sqlite::isDamage(found.error())) check((*store)->beginAnew().has_value());
         auto kept = (*store)->put(key, answerFor(key, size));
         if (!kept) {
             const auto begun = (*store)->beginAnew();
@@ -85,7 +85,7 @@ void use(const fs::path& directory)
         }
         const auto again = (*store)->find(key);
         check((again && *again && (*again)->body.size() == size) ||
-              (!again && HttpCacheStore::isDamage(again.error())));
+              (!again && Sqlite::isDamage(again.error())));
     }
 }
 

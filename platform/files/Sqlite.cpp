@@ -1,5 +1,7 @@
 #include "platform/files/Sqlite.h"
 
+#include <algorithm>
+#include <array>
 #include <cerrno>
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -84,6 +86,23 @@ Result<Sqlite> Sqlite::open(const std::filesystem::path& path, Access access)
     return result;
 }
 
+Result<void> Sqlite::adopt(std::span<const char* const> schema)
+{
+    std::vector<std::string> found;
+    auto done = run("SELECT sql FROM sqlite_schema WHERE sql IS NOT NULL AND name NOT LIKE 'sqlite\\_%' ESCAPE '\\'"
+                    " ORDER BY rowid",
+                    {}, [&](const Row& row) { found.emplace_back(row.text(0)); });
+    if (!done || std::ranges::equal(found, schema)) return done;
+    if (!found.empty())
+        return std::unexpected(Error::withReason(std::string(kSqliteErrorDomain), kCorrupt, "it has other tables"));
+    return transaction([&] {
+        Result<void> made;
+        for (const char* statement : schema)
+            if (made) made = execute(statement);
+        return made;
+    });
+}
+
 Result<void> Sqlite::execute(const char* statements)
 {
     if (sqlite3_exec(_database.get(), statements, nullptr, nullptr, nullptr) != SQLITE_OK) return failure();
@@ -148,7 +167,9 @@ std::int64_t Sqlite::lastInsertedRow() const
 
 bool Sqlite::isDamage(const Error& error)
 {
-    return error.domain == kSqliteErrorDomain && (error.code == kCorrupt || error.code == SQLITE_NOTADB);
+    constexpr std::array<std::int64_t, 7> kCodes{kCorrupt,          SQLITE_NOTADB,   SQLITE_ERROR, SQLITE_SCHEMA,
+                                                 SQLITE_CONSTRAINT, SQLITE_MISMATCH, SQLITE_TOOBIG};
+    return error.domain == kSqliteErrorDomain && std::ranges::find(kCodes, error.code) != kCodes.end();
 }
 
 bool Sqlite::Row::isNull(int column) const

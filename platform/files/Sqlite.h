@@ -7,6 +7,7 @@
 #include <map>
 #include <memory>
 #include <optional>
+#include <span>
 #include <string>
 #include <string_view>
 #include <variant>
@@ -51,6 +52,9 @@ public:
     /// only to be read.
     [[nodiscard]] static Result<Sqlite> open(const std::filesystem::path& path, Access access = Access::Exclusive);
 
+    /// Makes the tables and indexes of an empty database by these statements, or checks that it has exactly them, made
+    /// by the same texts. Fails with kCorrupt if it has others: what another version, or another program, made.
+    [[nodiscard]] Result<void> adopt(std::span<const char* const> schema);
     /// Runs statements without parameters and results.
     [[nodiscard]] Result<void> execute(const char* statements);
     /// Runs one statement; `each` is called with every row. It is kept, compiled, for the next time: let it be one of a
@@ -62,7 +66,8 @@ public:
     [[nodiscard]] std::int64_t lastInsertedRow() const;
 
     static constexpr std::int64_t kCorrupt = 11; ///< SQLITE_CORRUPT
-    /// Whether an error says that the file's contents are not, or no longer, a database.
+    /// Whether an error says that the file's contents aren't, or are no longer, what was written: not a database, or
+    /// one whose tables don't fit the statements.
     [[nodiscard]] static bool isDamage(const Error& error);
 
 private:

@@ -25,27 +25,13 @@ constexpr std::string_view kDownloadSuffix = ".download";
 /// Of a copy that a kill left half made.
 constexpr std::string_view kUnfinishedSuffix = ".tmp";
 constexpr std::string_view kTemporaryPrefix = "background-transfers-";
-/// Of the tables below; a store of another version is begun anew.
-constexpr std::int64_t kVersion = 1;
-
-constexpr const char* kTables = R"(
-CREATE TABLE task (
-    identifier INTEGER PRIMARY KEY AUTOINCREMENT,
-    upload INTEGER NOT NULL,
-    request TEXT NOT NULL,     -- JSON
-    requestBody TEXT NOT NULL, -- bytes
-    bodySize INTEGER NOT NULL,
-    note TEXT,                 -- JSON
-    resumed INTEGER NOT NULL,
-    deadline INTEGER NOT NULL, -- like notBefore and until: nanoseconds of the lived time
-    failures INTEGER NOT NULL,
-    notBefore INTEGER NOT NULL,
-    outcome TEXT               -- JSON; null until it has ended
-);
-CREATE TABLE hold (host TEXT PRIMARY KEY, until INTEGER NOT NULL);
-CREATE TABLE time (one INTEGER PRIMARY KEY CHECK (one = 1), lived INTEGER NOT NULL, wall INTEGER NOT NULL);
-PRAGMA user_version = 1;
-)";
+/// A store with other tables is begun anew. Times are nanoseconds of the lived time.
+constexpr std::array kSchema{
+    "CREATE TABLE task (identifier INTEGER PRIMARY KEY AUTOINCREMENT, upload INTEGER NOT NULL, request TEXT NOT NULL,"
+    " requestBody TEXT NOT NULL, bodySize INTEGER NOT NULL, note TEXT, resumed INTEGER NOT NULL,"
+    " deadline INTEGER NOT NULL, failures INTEGER NOT NULL, notBefore INTEGER NOT NULL, outcome TEXT)",
+    "CREATE TABLE hold (host TEXT PRIMARY KEY, until INTEGER NOT NULL)",
+    "CREATE TABLE time (one INTEGER PRIMARY KEY CHECK (one = 1), lived INTEGER NOT NULL, wall INTEGER NOT NULL)"};
 
 // ---- values ----
 
@@ -222,18 +208,12 @@ Result<void> BackgroundStore::openDatabase()
 
 Result<void> BackgroundStore::checkDatabase()
 {
-    const auto damaged = [](std::string reason) {
-        return std::unexpected(Error::withReason(std::string(kSqliteErrorDomain), Sqlite::kCorrupt, std::move(reason)));
-    };
-    std::int64_t version = 0;
-    auto done = _database->run("PRAGMA user_version", {}, [&](const Sqlite::Row& row) { version = row.integer(0); });
-    if (done && version == 0) return _database->transaction([&] { return _database->execute(kTables); });
-    if (done && version != kVersion) return damaged(fmt::format("version {}", version));
     std::string verdict;
-    if (done)
-        done = _database->run("PRAGMA quick_check(1)", {}, [&](const Sqlite::Row& row) { verdict = row.text(0); });
-    if (done && verdict != "ok") return damaged(verdict);
-    return done;
+    auto done = _database->run("PRAGMA quick_check(1)", {}, [&](const Sqlite::Row& row) { verdict = row.text(0); });
+    if (done && verdict != "ok")
+        done =
+            std::unexpected(Error::withReason(std::string(kSqliteErrorDomain), Sqlite::kCorrupt, std::move(verdict)));
+    return done ? _database->adopt(kSchema) : std::move(done);
 }
 
 Result<void> BackgroundStore::load()

@@ -208,7 +208,7 @@ private:
         if (openStore()) {
             noteUses();
             auto evicted = store->put(key, stored);
-            if (!evicted && HttpCacheStore::isDamage(evicted.error())) {
+            if (!evicted && Sqlite::isDamage(evicted.error())) {
                 failed(evicted.error()); // begins it anew
                 if (store) evicted = store->put(key, stored);
             }
@@ -257,7 +257,7 @@ private:
             *configuration.files, configuration.directory,
             {.capacity = configuration.diskCapacity, .minimumMappedSize = configuration.minimumMappedSize});
         auto keys = opened ? (*opened)->keys() : std::unexpected(opened.error());
-        if (opened && !keys && HttpCacheStore::isDamage(keys.error())) {
+        if (opened && !keys && Sqlite::isDamage(keys.error())) {
             logFailure(keys.error());
             if ((*opened)->beginAnew()) keys = (*opened)->keys();
         }
@@ -286,7 +286,7 @@ private:
     void failed(const Error& error)
     {
         logFailure(error);
-        if (!HttpCacheStore::isDamage(error)) return;
+        if (!Sqlite::isDamage(error)) return;
         if (auto begun = store->beginAnew(); !begun) {
             logFailure(begun.error());
             closeStore();

@@ -122,7 +122,7 @@ Result<std::unique_ptr<HttpCacheStore>> HttpCacheStore::open(FileSystem& files, 
     if (!lock) return std::unexpected(std::move(lock.error()));
     std::unique_ptr<HttpCacheStore> store(new HttpCacheStore(files, directory, limits, std::move(*lock)));
     auto opened = store->openIndex();
-    if (!opened && isDamage(opened.error())) {
+    if (!opened && Sqlite::isDamage(opened.error())) {
         defaultLog().error("the HTTP cache {} is damaged and begun anew: {}", directory.string(),
                            opened.error().description());
         opened = store->beginAnew();
@@ -134,14 +134,6 @@ Result<std::unique_ptr<HttpCacheStore>> HttpCacheStore::open(FileSystem& files, 
 HttpCacheStore::~HttpCacheStore()
 {
     if (_index && !_uses.empty()) (void)_index->transaction([this] { return saveUses(); });
-}
-
-bool HttpCacheStore::isDamage(const Error& error)
-{
-    constexpr std::array<std::int64_t, 5> kOthers{SQLITE_ERROR, SQLITE_SCHEMA, SQLITE_CONSTRAINT, SQLITE_MISMATCH,
-                                                  SQLITE_TOOBIG};
-    return Sqlite::isDamage(error) ||
-           (error.domain == kSqliteErrorDomain && std::ranges::find(kOthers, error.code) != kOthers.end());
 }
 
 bool HttpCacheStore::isInPlace() const
@@ -171,21 +163,8 @@ Result<void> HttpCacheStore::openIndex()
     _indexNumber = info->number;
     (void)_index->execute("PRAGMA synchronous = NORMAL"); // consistent after a power cut, if not of the last moment
 
-    std::vector<std::string> schema;
-    auto done =
-        _index->run("SELECT sql FROM sqlite_schema WHERE sql IS NOT NULL AND name NOT LIKE 'sqlite\\_%' ESCAPE '\\'"
-                    " ORDER BY rowid",
-                    {}, [&](const Sqlite::Row& row) { schema.emplace_back(row.text(0)); });
-    if (done && schema.empty())
-        done = _index->transaction([&] {
-            Result<void> made;
-            for (const char* statement : kSchema)
-                if (made) made = _index->execute(statement);
-            return made;
-        });
-    else if (done && !std::ranges::equal(schema, kSchema))
-        done = std::unexpected(damaged("the index has other tables"));
-    return done ? sweep() : std::move(done);
+    auto adopted = _index->adopt(kSchema);
+    return adopted ? sweep() : std::move(adopted);
 }
 
 Result<void> HttpCacheStore::sweep()

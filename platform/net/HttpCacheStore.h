@@ -46,8 +46,6 @@ public:
 
     /// False once someone took the directory or the index away.
     [[nodiscard]] bool isInPlace() const;
-    /// Whether an error says that the index isn't, or is no longer, what was written.
-    [[nodiscard]] static bool isDamage(const Error& error);
     /// Removes all and begins with an empty index.
     [[nodiscard]] Result<void> beginAnew();
 

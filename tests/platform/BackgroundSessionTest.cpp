@@ -10,6 +10,7 @@
 #include <gtest/gtest.h>
 
 #include "platform/files/Files.h"
+#include "platform/files/Sqlite.h"
 #include "platform/net/NetworkStatus.h"
 #include "platform/values/Json.h"
 #include "tests/support/FakeUrlLoader.h"
@@ -290,13 +291,17 @@ TEST_F(BackgroundSessionTest, ADamagedStoreIsBegunAnew)
         EXPECT_EQ(pwrite(file.fd(), bytes.data(), bytes.size(), static_cast<off_t>(offset)),
                   static_cast<ssize_t>(bytes.size()));
     };
+    const auto alter = [&](const char* statement) {
+        ASSERT_TRUE(Sqlite::open(store() / "transfers.db", Sqlite::Access::Exclusive)->execute(statement));
+    };
     const struct {
         const char* name;
         std::function<void()> hurt;
     } cases[]{
         {"no database", [&] { damage(0, "this is not a database"); }},
         {"broken page", [&] { damage(4096, std::string(4096, '\xff')); }},
-        {"another version", [&] { damage(60, std::string("\0\0\0\x63", 4)); }},
+        {"another shape", [&] { alter("ALTER TABLE task ADD COLUMN other TEXT"); }},
+        {"a table is missing", [&] { alter("DROP TABLE hold"); }},
         {"empty", [&] { fs::resize_file(store() / "transfers.db", 0); }},
         {"cut", [&] { fs::resize_file(store() / "transfers.db", 5000); }},
     };
@@ -314,7 +319,7 @@ TEST_F(BackgroundSessionTest, ADamagedStoreIsBegunAnew)
         next.answer(200);
         EXPECT_EQ(next.told().size(), 2u) << c.name;
     }
-    EXPECT_EQ(log.count("are damaged and begun anew"), 4) << "an empty file is a new store";
+    EXPECT_EQ(log.count("are damaged and begun anew"), 5) << "an empty file is a new store";
 }
 
 TEST_F(BackgroundSessionTest, WhereTheStoreCantBeUsedTasksWorkAndEndWithTheProcess)
