@@ -3,10 +3,8 @@
 #include <algorithm>
 #include <cerrno>
 #include <charconv>
-#include <fcntl.h>
 #include <mutex>
 #include <set>
-#include <sys/file.h>
 
 #include "platform/base/Log.h"
 #include "platform/files/Files.h"
@@ -21,7 +19,10 @@ namespace fs = std::filesystem;
 
 namespace {
 constexpr std::size_t kMaximumSize = 4u << 20;
-}
+/// How often, and after what time each, a lock is tried that another process has.
+constexpr int kLockAttempts = 20;
+constexpr std::chrono::milliseconds kLockDelay(100);
+} // namespace
 
 struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
     FileSystem* files = nullptr; // null: in memory only
@@ -36,6 +37,7 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
     bool fileIsBroken = false;
     std::mutex writing; // one reader or writer of the file at a time; taken before `mutex`
     std::unique_ptr<FileWatch> watch;
+    int lockAttempts = 0; // in vain, since the last write; write queue only
 
     /// What the file has; nothing where it is missing, an error where it can't be read or is no JSON object.
     Result<Dictionary> readFile() const
@@ -70,8 +72,25 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
         values = std::move(*contents);
     }
 
-    /// Writes what was set over what the file has by now.
-    Result<void> write()
+    enum class Lock { Needed, Wanted };
+
+    /// On the write queue. Writes what was set, once the lock is free or was tried often enough.
+    void writeSoon()
+    {
+        const auto done = write(lockAttempts + 1 < kLockAttempts ? Lock::Needed : Lock::Wanted);
+        const bool isLocked = !done && done.error().code == EWOULDBLOCK;
+        lockAttempts = isLocked ? lockAttempts + 1 : 0;
+        if (!isLocked) return;
+        {
+            std::lock_guard lock(mutex);
+            if (std::exchange(writeQueued, true)) return;
+        }
+        writeQueue->after(kLockDelay, [self = shared_from_this()] { self->writeSoon(); });
+    }
+
+    /// Writes what was set over what the file has by now. Fails with EWOULDBLOCK, and has done nothing, if another
+    /// process has a lock that is needed.
+    Result<void> write(Lock need)
     {
         std::lock_guard writer(writing);
         {
@@ -80,10 +99,13 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
             if (dirty.empty()) return {};
         }
         if (auto made = files->createDirectories(path.parent_path()); !made) return writeFailed(made.error());
-        // Against others who edit the file in the same way; where there can be no lock, we go on without.
-        const FileHandle lockFile(
-            open((path.string() + ".lock").c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600));
-        if (lockFile) flock(lockFile.fd(), LOCK_EX);
+        // Against others who edit the file in the same way.
+        const auto lockFile = files->lock(path.string() + ".lock");
+        if (!lockFile && need == Lock::Needed && lockFile.error().code == EWOULDBLOCK)
+            return std::unexpected(lockFile.error());
+        if (!lockFile)
+            defaultLog().error("user defaults {} are written without a lock: {}", path.string(),
+                               lockFile.error().description());
 
         auto contents = readFile();
         if (!contents) keepAside();
@@ -203,12 +225,12 @@ void UserDefaults::set(std::string_view key, Value value)
     if (!_impl->files) return;
     _impl->dirty.emplace(key);
     if (!_impl->writeQueue || std::exchange(_impl->writeQueued, true)) return;
-    _impl->writeQueue->async([impl = _impl] { (void)impl->write(); });
+    _impl->writeQueue->async([impl = _impl] { impl->writeSoon(); });
 }
 
 Result<void> UserDefaults::synchronize()
 {
-    return _impl->files ? _impl->write() : Result<void>();
+    return _impl->files ? _impl->write(Impl::Lock::Wanted) : Result<void>();
 }
 
 void UserDefaults::reload()

@@ -27,6 +27,9 @@ class RunLoop;
 ///
 /// set() is seen by readers at once and written soon, atomically, together with what else was set by then; keys that
 /// others changed in the file meanwhile are kept. A process that is killed may lose what synchronize() hasn't written.
+///
+/// Whoever writes holds a lock on the file's name with ".lock" behind it. Nobody waits for it: while another process
+/// has it, a write is put off for up to two seconds; then, and in synchronize() at once, it is done without.
 class UserDefaults {
 public:
     /// A suite kept at `path`. `writeQueue` (serial) runs the writes.
@@ -53,7 +56,7 @@ public:
     /// Dates are kept as seconds since 1970. A null removes the key.
     void set(std::string_view key, Value value);
     void remove(std::string_view key) { set(key, Value()); }
-    /// Writes what was set, now. Failures are logged and answered, and tried again with the next write.
+    /// Writes what was set, now. Failures are logged and returned, and tried again with the next write.
     Result<void> synchronize();
     /// Reads the file again, as the watch does.
     void reload();

@@ -19,6 +19,7 @@ namespace platform {
 namespace {
 
 namespace fs = std::filesystem;
+using namespace std::chrono_literals;
 using test::writeFile;
 
 struct UserDefaultsTest : testing::Test {
@@ -178,6 +179,30 @@ TEST_F(UserDefaultsTest, BrokenFilesReadAsEmptyAndAreKeptBeside)
         EXPECT_EQ(text(path.string() + ".corrupt"), broken);
     }
     EXPECT_TRUE(log.has(LogLevel::Error, "default", "can't be read, defaults apply"));
+}
+
+TEST_F(UserDefaultsTest, ALockThatAnotherProcessKeepsPutsAWriteOffButNotForEver)
+{
+    const auto advance = [this](Duration by) { clock.advance(by, [this] { executor.drain(); }); };
+    fs::create_directory(path.parent_path());
+    UserDefaults defaults(*files, path, queue);
+    for (const Duration held : {Duration(500ms), Duration(1h)}) {
+        fs::remove(path);
+        auto lock = files->lock(path.string() + ".lock");
+        defaults.set("a", 1);
+        executor.drain();
+        for (int i = 0; i < 4; ++i, advance(100ms)) defaults.set("b", i);
+        EXPECT_FALSE(fs::exists(path)) << "tried, and put off";
+        EXPECT_EQ(clock.pendingTimers(), 1u);
+        if (held < 2s) lock = FileHandle();
+        advance(held < 2s ? Duration(100ms) : Duration(2s));
+        EXPECT_EQ(file(), Value(Dictionary{{"a", 1}, {"b", 3}})) << toSeconds(held);
+        EXPECT_EQ(clock.pendingTimers(), 0u);
+        EXPECT_EQ(log.count("are written without a lock"), held < 2s ? 0 : 1);
+        defaults.set("a", 2);
+        EXPECT_TRUE(defaults.synchronize()) << "waits for nobody";
+        EXPECT_EQ(file()["a"], Value(2));
+    }
 }
 
 TEST_F(UserDefaultsTest, AWriteThatFailedIsTriedAgainWithTheNext)
