@@ -1,10 +1,12 @@
 #include "platform/files/Counters.h"
 
+#include <algorithm>
 #include <atomic>
 #include <cerrno>
 #include <mutex>
 #include <shared_mutex>
 #include <unordered_map>
+#include <vector>
 
 #include <fmt/format.h>
 
@@ -22,6 +24,8 @@ namespace {
 constexpr std::chrono::seconds kBatch{60};
 /// Keys are built from clients' names and agents: a hostile one must not fill the memory.
 constexpr std::size_t kMaximumCounters = 4096;
+/// How many make way at once, so that finding them costs little for each.
+constexpr std::size_t kMakeWay = kMaximumCounters / 8;
 constexpr std::size_t kMaximumKeyLength = 512;
 /// As many counters as there may be, with keys of escapes ("\u0001") and numbers of 20 digits, can be read back.
 constexpr std::size_t kMaximumSize = kMaximumCounters * (6 * kMaximumKeyLength + 32);
@@ -38,27 +42,50 @@ struct CounterStore::Impl : std::enable_shared_from_this<Impl> {
     std::filesystem::path path;
     std::shared_ptr<Queue> writeQueue;
 
-    mutable std::shared_mutex mutex;
-    std::unordered_map<std::string, std::atomic<std::int64_t>, KeyHash, std::equal_to<>> counters; // under the mutex
-    std::atomic<bool> writeQueued = false;
+    struct Counter {
+        explicit Counter(std::int64_t value_)
+            : value(value_), uses(static_cast<std::uint64_t>(std::max<std::int64_t>(value_, 0)))
+        {}
+        std::atomic<std::int64_t> value;
+        std::atomic<std::uint64_t> uses; ///< those of earlier processes are taken from the value
+    };
 
-    /// Calls `change` with the counter, made if it isn't there.
+    mutable std::shared_mutex mutex;
+    std::unordered_map<std::string, Counter, KeyHash, std::equal_to<>> counters; // under the mutex
+    std::atomic<bool> writeQueued = false;
+    mutable std::mutex writing; // keeps an older state from overwriting a newer one
+
+    /// Calls `change` with the counter's value; makes the counter if it isn't there.
     template <class Change> void with(std::string_view key, Change change)
     {
         {
             std::shared_lock lock(mutex);
             if (const auto found = counters.find(key); found != counters.end()) {
-                change(found->second);
+                change(found->second.value);
+                found->second.uses.fetch_add(1, std::memory_order_relaxed);
                 lock.unlock();
                 return changed();
             }
         }
         {
             std::unique_lock lock(mutex);
-            if (counters.size() >= kMaximumCounters || key.size() > kMaximumKeyLength) return;
-            change(counters.try_emplace(std::string(key), 0).first->second);
+            if (key.size() > kMaximumKeyLength) return;
+            if (counters.size() >= kMaximumCounters && !counters.contains(key)) makeWay();
+            Counter& counter = counters.try_emplace(std::string(key), 0).first->second;
+            change(counter.value);
+            ++counter.uses;
         }
         changed();
+    }
+
+    /// Removes the least used. Under the mutex, exclusively.
+    void makeWay()
+    {
+        std::vector<std::pair<std::uint64_t, std::string_view>> byUse;
+        for (const auto& [key, counter] : counters) byUse.emplace_back(counter.uses.load(), key);
+        std::ranges::nth_element(byUse, byUse.begin() + kMakeWay);
+        byUse.resize(kMakeWay);
+        for (const auto& [uses, key] : byUse) counters.erase(counters.find(key));
     }
 
     void changed()
@@ -72,12 +99,15 @@ struct CounterStore::Impl : std::enable_shared_from_this<Impl> {
 
     std::map<std::string, std::int64_t> snapshot() const
     {
+        std::map<std::string, std::int64_t> all;
         std::shared_lock lock(mutex);
-        return {counters.begin(), counters.end()};
+        for (const auto& [key, counter] : counters) all.emplace(key, counter.value.load());
+        return all;
     }
 
     void write() const
     {
+        const std::lock_guard writer(writing);
         Dictionary contents;
         for (const auto& [key, count] : snapshot()) contents.set(key, count);
         auto made = files->createDirectories(path.parent_path());
@@ -137,11 +167,16 @@ void CounterStore::clear(std::string_view key)
     _impl->changed();
 }
 
+void CounterStore::synchronize()
+{
+    if (_impl->files) _impl->write();
+}
+
 std::int64_t CounterStore::value(std::string_view key) const
 {
     std::shared_lock lock(_impl->mutex);
     const auto found = _impl->counters.find(key);
-    return found == _impl->counters.end() ? 0 : found->second.load();
+    return found == _impl->counters.end() ? 0 : found->second.value.load();
 }
 
 std::map<std::string, std::int64_t> CounterStore::snapshot() const
