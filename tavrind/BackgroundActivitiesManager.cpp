@@ -1,6 +1,9 @@
 #include "tavrind/BackgroundActivitiesManager.h"
 
 #include "platform/device/Device.h"
+#include "platform/files/Counters.h"
+#include "platform/files/Files.h"
+#include "platform/run/Clock.h"
 #include "platform/run/Queue.h"
 #include "platform/run/Transactions.h"
 #include "tavrind/Assembly.h"
@@ -24,6 +27,8 @@ constexpr const char* kActivity = "com.quorvane.tavrind.flusher.background";
 constexpr std::chrono::seconds kDelay = 300s;
 constexpr std::chrono::seconds kInterval = 600s;
 constexpr std::chrono::seconds kGracePeriod = 300s;
+/// No body takes so long to make.
+constexpr std::chrono::hours kOldBody(1);
 
 const platform::Log& log()
 {
@@ -104,6 +109,7 @@ void BackgroundActivitiesManager::insertFlushActivity(std::move_only_function<vo
 void BackgroundActivitiesManager::_flusherActivity()
 {
     _queueFlusher->assertOnQueue();
+    _sweepBodies();
     for (const auto& container : _assembly.persistentStorage->getAvailableSessionHandles()) {
         const auto session = container->read();
         _assembly.persistentStorage->deleteSessionWithFileContainer(container);
@@ -117,6 +123,20 @@ void BackgroundActivitiesManager::_flusherActivity()
     _assembly.feedbackBooks.save();
 }
 
+/// Removes the files of processes that were killed while they made an upload's body: there are users' events in them. A
+/// young file may be one that is being made.
+void BackgroundActivitiesManager::_sweepBodies()
+{
+    const std::filesystem::path& directory = _assembly.device.directories.temporary;
+    const platform::Date oldest = _assembly.device.clock.wallNow() - kOldBody;
+    for (const std::string& name : _assembly.fileManager.list(directory).value_or(std::vector<std::string>())) {
+        if (!name.starts_with(kUploadBodyPrefix)) continue;
+        const auto info = _assembly.fileManager.info(directory / name);
+        if (!info || info->kind != platform::FileInfo::Kind::File || info->modified > oldest) continue;
+        if (_assembly.fileManager.remove(directory / name)) log().log("an unfinished upload is removed: {}", name);
+    }
+}
+
 void BackgroundActivitiesManager::_flushToWire(TavrinFeedbackFlusher& flusher)
 {
     for (const platform::Bytes& body : flusher.flushToWireSync())
@@ -125,6 +145,7 @@ void BackgroundActivitiesManager::_flushToWire(TavrinFeedbackFlusher& flusher)
 
 void BackgroundActivitiesManager::findUploads()
 {
+    _queueFlusher->async([self = shared_from_this()] { self->_sweepBodies(); });
     _assembly.uploadURLSession->getTasks(
         [weak = weak_from_this()](const std::vector<std::shared_ptr<platform::BackgroundTask>>& tasks) {
             const auto self = weak.lock();
@@ -170,7 +191,9 @@ void BackgroundActivitiesManager::taskDidComplete(const std::shared_ptr<platform
     }
     _assembly.feedbackBooks.move(FeedbackFate::Uploading, sent ? FeedbackFate::Sent : FeedbackFate::NotSent,
                                  UploadNote::from(task->note()).events);
-    _assembly.feedbackBooks.saveSoon();
+    // The session forgets the task once this returns: from then on a kill must not lose what it counted.
+    _assembly.feedbackBooks.save();
+    _assembly.device.counters.synchronize();
 }
 
 void BackgroundActivitiesManager::sessionDidFinishEvents()

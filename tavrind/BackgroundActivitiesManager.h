@@ -38,7 +38,8 @@ public:
     void setStopFlushing(bool stop) { _stopFlushing = stop; }
 
     [[nodiscard]] const std::shared_ptr<TavrinFeedbackFlusher>& feedbackFlusher() const { return _feedbackFlusher; }
-    /// Books the uploads that an earlier process left under way; once the upload session is there.
+    /// Books the uploads that an earlier process left under way, and removes the unfinished bodies that it left; once
+    /// the upload session is there.
     void findUploads();
 
     void taskDidSendBodyData(const std::shared_ptr<platform::BackgroundTask>& task, std::uint64_t sent,
@@ -52,6 +53,7 @@ public:
 private:
     void _runActivity(const std::shared_ptr<platform::Activity>& activity);
     void _flusherActivity();
+    void _sweepBodies();
     void _flushToWire(TavrinFeedbackFlusher& flusher);
     void _findUpload(const platform::BackgroundTask& task);
 

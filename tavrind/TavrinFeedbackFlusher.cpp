@@ -57,7 +57,7 @@ platform::Result<std::unique_ptr<platform::AppendFile>>
 makeTemporaryFile(platform::FileSystem& files, const std::filesystem::path& directory, std::filesystem::path& path)
 {
     for (int attempt = 0;; ++attempt) {
-        path = directory / ("flusher_" + platform::Uuid::random().string().substr(0, 6));
+        path = directory / (std::string(kUploadBodyPrefix) + platform::Uuid::random().string().substr(0, 6));
         if (path.native().size() >= kMaximumPath) return std::unexpected(platform::Error::posix(ENAMETOOLONG));
         auto file = files.createForAppending(path);
         if (file || file.error().code != EEXIST || attempt == kMaximumNameAttempts) return file;

@@ -30,6 +30,9 @@ class TAVBag;
 /// "crowdsourcing" for 0, "Feedbacks" for 1, else the empty text.
 [[nodiscard]] std::string_view convertIdentifierToString(std::int64_t identifier);
 
+/// The names of files that hold an upload's body while it is made begin like this; they are in the temporary directory.
+inline constexpr std::string_view kUploadBodyPrefix = "flusher_";
+
 /// The upload session's note on a task: whose it is, the count that its end is booked with in the statistics, and the
 /// recorded events in it.
 struct UploadNote {

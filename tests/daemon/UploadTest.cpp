@@ -370,6 +370,33 @@ TEST_F(UploadTest, AnUploadThatCannotBeMadeIsDropped)
     expectBooksClose();
 }
 
+TEST_F(UploadTest, BodiesThatAKilledProcessLeftAreSweptOnceTheyAreOld)
+{
+    begin();
+    for (const char* name : {"flusher_123abc", "other"}) device.files.files[std::filesystem::path("/tmp") / name] = "x";
+    restart();
+    EXPECT_EQ(temporaryFiles(), 2u) << "another process may be making it";
+    device.advance(1h);
+    upload();
+    EXPECT_EQ(temporaryFiles(), 1u) << "with the next pass";
+    device.files.files["/tmp/flusher_123abc"] = "x";
+    restart();
+    EXPECT_FALSE(device.files.files.contains("/tmp/flusher_123abc")) << "and at the start";
+    EXPECT_TRUE(device.files.files.contains("/tmp/other"));
+}
+
+TEST_F(UploadTest, TheEndOfAnUploadIsInTheBooksOnceItIsForgotten)
+{
+    begin();
+    const std::int64_t before = booked(FeedbackFate::Sent);
+    uploadOne()->respond(200);
+    device.drain();
+    restart();
+    EXPECT_TRUE(uploads().empty());
+    EXPECT_EQ(booked(FeedbackFate::Sent) - before, 2);
+    EXPECT_EQ(booked(FeedbackFate::Unknown), 0);
+}
+
 TEST_F(UploadTest, BooksAcrossKills)
 {
     begin();

@@ -105,8 +105,8 @@ Result<FileInfo> MemoryFiles::info(const fs::path& path)
     takeIn(path);
     if (directories.contains(path)) return FileInfo{.kind = FileInfo::Kind::Directory};
     if (!files.contains(path)) return std::unexpected(Error::posix(ENOENT));
-    return FileInfo{.size = files[path].size(),
-                    .created = created.contains(path) ? created[path] : dateFromSecondsSince1970(1767225600)};
+    const Date date = created.contains(path) ? created[path] : dateFromSecondsSince1970(1767225600);
+    return FileInfo{.size = files[path].size(), .modified = date, .created = date};
 }
 
 Result<void> MemoryFiles::remove(const fs::path& path)
