@@ -23,6 +23,7 @@
 #include "platform/device/SystemNotifier.h"
 #include "platform/device/SystemNotifierSessionBus.h"
 #include "platform/files/Counters.h"
+#include "platform/files/Files.h"
 #include "platform/files/UserDefaults.h"
 #include "platform/ipc/BusTransport.h"
 #include "platform/ipc/Ipc.h"
@@ -123,6 +124,9 @@ struct SystemDevice::Impl {
                  .activities = *activities,
                  .ipc = *ipc}
     {
+        // Whoever made them, an installer or an application, may have let others in.
+        for (const auto* parent : {&directories.caches, &directories.config, &directories.state, &directories.data})
+            makePrivate(*parent / names.service);
         device.launchEvents = launchEvents();
         device.makeQueues();
         userDefaults.watch(runLoop);

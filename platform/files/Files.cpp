@@ -337,6 +337,14 @@ fs::path home()
 
 } // namespace
 
+void makePrivate(const fs::path& directory)
+{
+    const FileHandle opened(open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+    struct stat status{};
+    if (!opened || fstat(opened.fd(), &status) != 0 || status.st_uid != geteuid()) return;
+    if ((status.st_mode & 0077) != 0) fchmod(opened.fd(), 0700);
+}
+
 Result<FileInfo> fileInfo(const FileHandle& file)
 {
     struct statx status{};

@@ -96,6 +96,10 @@ public:
 
 [[nodiscard]] std::unique_ptr<FileSystem> makeSystemFiles();
 
+/// Takes access to a directory of this user's from everybody else: mode 0700. Does nothing if it isn't there, or is a
+/// link or another user's. Any thread.
+void makePrivate(const std::filesystem::path& directory);
+
 // Of open files. Any thread.
 
 [[nodiscard]] Result<FileInfo> fileInfo(const FileHandle& file);

@@ -157,6 +157,11 @@ TEST_F(FilesTest, ADirectoryIsTakenByOneHandleAtATime)
     writeFile(directory / "file", "x");
     for (const char* name : {"link", "file"})
         EXPECT_EQ(failure(files->takeDirectory(directory / name)), ENOTDIR) << name;
+    fs::permissions(directory / "open", fs::perms(0755));
+    makePrivate(directory / "link");
+    EXPECT_EQ(mode(directory / "open"), 0755u) << "not through a link";
+    makePrivate(directory / "open");
+    EXPECT_EQ(mode(directory / "open"), 0700u);
     EXPECT_TRUE(files->removeDirectory(directory / "made"));
     EXPECT_FALSE(fs::exists(directory / "made"));
     EXPECT_TRUE(files->removeDirectory(directory / "none"));
