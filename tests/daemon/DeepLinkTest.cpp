@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include "platform/privacy/PrivacyLedger.h"
+#include "platform/privacy/RandomizedResponse.h"
 #include "platform/values/Json.h"
 #include "platform/values/Value.h"
 #include "tavrind/Assembly.h"
@@ -255,6 +256,7 @@ TEST_F(DeepLinkIngesterTest, RecordsTheLastDaysLinksThroughTheLists)
     add("org.allowed", "https://a.example/2", 24h);
     add("org.allowed", "https://a.example/3", 24h + 1s);
     add("org.allowed", "https://a.example/4", 1h, false);
+    add("org.allowed", "https://a.example/5", -1h);
     add("org.unknown", "https://b.example/");
     add("org.denied", "https://c.example/");
     run();
@@ -263,6 +265,43 @@ TEST_F(DeepLinkIngesterTest, RecordsTheLastDaysLinksThroughTheLists)
     EXPECT_EQ(reports(), 3u);
     EXPECT_EQ(log.count("fetch crowdsourcing whitelist") + log.count("fetch crowdsourcing blacklist"), 2);
     EXPECT_EQ(device.activities.registered.at("com.quorvane.Tavrin.DeepLinkIngest").first.interval, 12h);
+}
+
+/// Of enough reports of one text the permanent response shows, which depends on the key.
+TEST_F(DeepLinkIngesterTest, RecordsUnderTheApplicationsKeyInsideATransaction)
+{
+    constexpr int kRuns = 60;
+    std::map<std::string, int> open;
+    device.files.fault = [&](std::string_view operation, const auto&) {
+        if (operation == "database") open = device.transactions.open();
+        return 0;
+    };
+    for (int i = 0; i < kRuns; ++i, device.advance(12h)) {
+        add("org.unknown", "https://b.example/");
+        run();
+    }
+    EXPECT_TRUE(open.contains("com.quorvane.Tavrin.DeepLinkIngest"));
+    EXPECT_TRUE(device.transactions.open().empty());
+    device.files.fault = {};
+    const std::filesystem::path privacy = "/state/com.quorvane.tavrind/privacy";
+    const auto secret = platform::PrivacyLedger::parse(device.files.files.at(privacy / "ledger")).value().secret;
+    const platform::Value all = platform::parseJson(device.files.files.at(privacy / "reports.json")).value();
+    ASSERT_EQ(all.count(), static_cast<std::size_t>(kRuns));
+    const std::string key = "com.quorvane.tavrin.AppDeepLink.org.unknown";
+    platform::PrivacyBits expected = platform::permanentFlips(secret, key, "org.unknown");
+    const unsigned own = platform::privacyBit(platform::privacyCohort(secret), key, "org.unknown");
+    expected[own / 8] ^= static_cast<std::uint8_t>(1U << own % 8);
+    int different = 0;
+    for (unsigned bit = 0; bit < platform::kPrivacyBits; ++bit) {
+        int set = 0;
+        for (std::size_t i = 0; i < all.count(); ++i) {
+            platform::PrivacyBits bits{};
+            ASSERT_TRUE(platform::readHex(*all[i]["bits"].asString(), bits));
+            set += platform::hasBit(bits, bit);
+        }
+        different += (set > kRuns / 2) != platform::hasBit(expected, bit);
+    }
+    EXPECT_LT(different, 10) << "of 256; about 128 under another key";
 }
 
 TEST_F(DeepLinkIngesterTest, ReadsNoMoreThanAHundredActivities)

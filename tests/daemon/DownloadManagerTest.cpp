@@ -321,14 +321,24 @@ TEST_F(DownloadManagerTest, LookupHintsFollowTheBagTheirRedirectAndTheLocation)
         deliver(304, ""); // ahead of the redirect
     }
 
+    const auto third = download(hints, "https://r.example/hints?version=1");
+    EXPECT_TRUE(third);
+    deliver(200, "x"); // from where it was asked for
+    EXPECT_TRUE(device.userDefaults.value("download_resources")[hints]["redirect_url"].isNull())
+        << "the earlier redirect is not that of this file";
+
+    std::size_t before = tasks().size();
+    bag({{hints, "https://r.example/hints?version=2"}});
     lookup->enabled = false;
-    const std::size_t before = tasks().size();
+    device.advance(60s);
+    EXPECT_EQ(tasks().size(), before) << "disabled during the delay";
+    EXPECT_EQ(log.count("TAVLookupHintsWeekly is disabled, not downloading"), 1);
     (void)download(hints, "https://r.example/hints?version=2");
     EXPECT_EQ(tasks().size(), before);
     bag({});
     EXPECT_EQ(contents(hints), "x") << "left as it was";
     EXPECT_TRUE(manager->resourceForKey(hints));
-    EXPECT_TRUE(log.count("TAVLookupHintsWeekly is disabled, not downloading"));
+    EXPECT_EQ(log.count("TAVLookupHintsWeekly is disabled, not downloading"), 3) << "with every bag";
     lookup->enabled = true;
 
     watched = hints;
@@ -341,8 +351,43 @@ TEST_F(DownloadManagerTest, LookupHintsFollowTheBagTheirRedirectAndTheLocation)
     EXPECT_FALSE(manager->resourceForKey(hints));
     EXPECT_EQ(contents(hints), "x");
     EXPECT_EQ(told, std::vector<std::string>{"deleted"}) << "whoever uses the hints of another place stops";
-    const auto third = download(hints, "https://r.example/hints?version=1");
-    EXPECT_EQ(header(third->originalRequest(), "If-None-Match"), "") << "another place has other hints";
+    EXPECT_TRUE(device.userDefaults.value("download_resources")[hints].isNull());
+    const auto elsewhere = download(hints, "https://r.example/hints?version=1");
+    EXPECT_EQ(header(elsewhere->originalRequest(), "If-None-Match"), "") << "another place has other hints";
+}
+
+TEST_F(DownloadManagerTest, OnlyLookupHintsAreAskedForWithTheLocation)
+{
+    Dictionary all;
+    for (const std::string_view identifier : kTAVResourceIdentifiers)
+        all.set(std::string(identifier), "https://r.example/" + std::string(identifier));
+    device.location.moveTo(platform::fuzz(47.37, 8.54, "wifi"));
+    bag(std::move(all));
+    assembly.requestFactory->setPerformedSearch();
+    device.drain();
+    device.advance(60s);
+    ASSERT_EQ(tasks().size(), kTAVResourceIdentifiers.size());
+    for (const auto& task : tasks()) {
+        const std::string identifier = header(task->originalRequest(), "X-Quorvane-Download-Identifier");
+        EXPECT_EQ(header(task->originalRequest(), "X-Quorvane-FuzzedLatLong") != "",
+                  identifier == "TAVLookupHintsWeekly" || identifier == "TAVLookupHintsMonthly")
+            << identifier;
+    }
+}
+
+TEST_F(DownloadManagerTest, OfTwoBagsAtOnceTheSecondCounts)
+{
+    for (const char* version : {"1", "2"})
+        device.notifications.post(
+            {.name = TAVBagChangeNotification,
+             .userInfo = {
+                 {"bag", std::make_shared<const TAVBag>(
+                             Dictionary{{"TAVQIFeatures", "https://r.example/f?version=" + std::string(version)}},
+                             "Vistrel/4")}}});
+    device.drain();
+    device.advance(60s);
+    ASSERT_EQ(tasks().size(), 1u);
+    EXPECT_EQ(tasks()[0]->originalRequest().url.queryValue("version"), "2");
 }
 
 TEST_F(DownloadManagerTest, NothingOvertakesABagThatWaitsForTheListOfDownloads)

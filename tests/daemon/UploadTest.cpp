@@ -82,20 +82,62 @@ TEST_F(UploadTest, EndsAreCounted)
     uploadOne()->respond(200);
     device.drain();
     EXPECT_EQ(counter("feedbacksent") - sent, 7) << "top-level keys are what is counted";
-    uploadOne()->respond(500);
+    const LogCapture log;
+    const auto refused = uploadOne();
+    refused->files.progress(50, 200);
+    device.drain();
+    EXPECT_EQ(log.count("data transfer 25.000000 of 200.000000"), 1);
+    refused->respond(204); // any status but 200
+    device.drain();
+    EXPECT_EQ(log.count("response error 204"), 1);
+    EXPECT_EQ(counter("feedbacknotsent"), 7);
     uploadOne()->fail(fail(platform::kUrlTooLarge));
     device.drain();
     uploadOne()->fail(fail(platform::kUrlConnectionLost));
     device.drain();
     EXPECT_EQ(counter("feedbacknotsent"), 14) << "it is tried again";
+    EXPECT_EQ(counter("fbrequesttimedout"), 0);
     device.advance(7 * 24h);
     EXPECT_EQ(counter("feedbacksent") - sent, 7);
-    EXPECT_EQ(counter("feedbacknotsent"), 21);
+    EXPECT_EQ(counter("feedbacknotsent"), 21) << "given up after a week";
     EXPECT_EQ(counter("fbrequesttimedout"), 1);
     EXPECT_TRUE(assembly().backgroundFlusher->feedbackFlusher()->feedbacksPerTask().empty());
     EXPECT_EQ(booked(FeedbackFate::Sent) - bookedAsSent, 2);
     EXPECT_EQ(booked(FeedbackFate::NotSent), 6);
     expectBooksClose();
+}
+
+TEST_F(UploadTest, UploadsWaitAWeekOnAnyNetworkAndDownloadsADayForOneFreeOfCharge)
+{
+    begin();
+    auto& loads = device.background.loads;
+    const auto downloads = [&] { return loads.at("com.quorvane.tavrind")->tasks.size(); };
+    const LogCapture log;
+    device.background.network.set({.metered = true});
+    const auto task = uploadOne();
+    EXPECT_FALSE(task->finished);
+    assembly().bagController->forceFetchBag(Value::dictionaryOf({{"bag", 1000}}));
+    device.drain();
+    respond(R"({"version": "1000", "TAVQIFeatures": "https://r.example/f", "feedbackURL": "https://f.example/f"})");
+    device.advance(2min);
+    EXPECT_EQ(downloads(), 0u) << "metered";
+    device.background.network.set({});
+    device.drain();
+    EXPECT_EQ(downloads(), 1u);
+
+    const std::int64_t notSent = counter("feedbacknotsent");
+    device.advance(24h - 10min);
+    EXPECT_EQ(log.count("download task error"), 0);
+    device.advance(10min);
+    EXPECT_EQ(log.count("download task error"), 1);
+    EXPECT_EQ(device.background.configurations.at("com.quorvane.tavrind.flusher.nsurlsession").requestTimeout, 300s);
+    device.advance(6 * 24h - 10min);
+    EXPECT_EQ(counter("feedbacknotsent"), notSent);
+    EXPECT_FALSE(task->finished);
+    device.advance(10min);
+    EXPECT_TRUE(task->finished);
+    EXPECT_GT(counter("feedbacknotsent"), notSent);
+    EXPECT_GT(counter("fbrequesttimedout"), 0);
 }
 
 TEST_F(UploadTest, CrowdsourcingRecordsGoOutOnTheirOwn)
@@ -245,10 +287,20 @@ TEST_F(UploadTest, StatesOfTheActivity)
     EXPECT_TRUE(criteria.repeating && criteria.allowBattery);
 
     LogCapture log;
+    appear();
+    flushSession();
     auto run = device.activities.run("com.quorvane.tavrind.flusher.background");
     EXPECT_EQ(run->state(), ActivityState::Continue);
     EXPECT_FALSE(device.transactions.open().empty()) << "the process is wanted";
+    std::vector<ActivityState> during;
+    device.files.fault = [&](std::string_view operation, const auto&) {
+        if (operation == "remove") during.push_back(run->state());
+        return 0;
+    };
     device.drain();
+    device.files.fault = {};
+    EXPECT_FALSE(during.empty());
+    EXPECT_EQ(std::ranges::count(during, ActivityState::Continue), std::ssize(during)) << "done when the pass is";
     EXPECT_EQ(run->state(), ActivityState::Done);
     EXPECT_TRUE(device.transactions.open().empty());
 
@@ -267,6 +319,12 @@ TEST_F(UploadTest, StatesOfTheActivity)
     EXPECT_TRUE(log.has(platform::LogLevel::Fault, "Tavrin_Flusher", "State transition from 2 to 5 invalid"));
     EXPECT_EQ(log.count("State transition"), 2);
     EXPECT_TRUE(sessionFiles().empty()) << "the pass ran all the same";
+
+    settle();
+    daemon.reset();
+    device.drain();
+    EXPECT_FALSE(device.activities.registered.contains("com.quorvane.tavrind.flusher.background"));
+    start(); // for what the fixture tears down
 }
 
 TEST_F(UploadTest, FaultsOfTheDiskLoseOneSessionAndNothingElse)

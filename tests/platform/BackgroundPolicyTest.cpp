@@ -40,7 +40,7 @@ TEST(BackgroundPolicy, OnlyWhatMayGetBetterIsTriedAgain)
     for (const auto code :
          {kUrlBadUrl, kUrlForbiddenRedirect, kUrlTooLarge, kUrlTooManyRedirects, kUrlUnsupported, kUrlCancelled})
         EXPECT_FALSE(better(kUrlErrorDomain, code)) << code;
-    EXPECT_TRUE(better(kPosixErrorDomain, ENOSPC));
+    for (const int full : {ENOSPC, EDQUOT}) EXPECT_TRUE(better(kPosixErrorDomain, full)) << full;
     EXPECT_FALSE(better(kPosixErrorDomain, EIO) || better("other", 1));
 }
 
