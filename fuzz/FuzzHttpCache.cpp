@@ -84,8 +84,7 @@ void use(const fs::path& directory)
             check(kept.has_value(), kept ? "" : kept.error().description());
         }
         const auto again = (*store)->find(key);
-        check((again && *again && (*again)->body.size() == size) ||
-              (!again && Sqlite::isDamage(again.error())));
+        check((again && *again && (*again)->body.size() == size) || (!again && Sqlite::isDamage(again.error())));
     }
 }
 

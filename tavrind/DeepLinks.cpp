@@ -53,7 +53,7 @@ std::string normalizedPath(std::string_view path)
     return result;
 }
 
-/// The host of an authority. Nothing where it can't be one.
+/// The host of an authority; nothing if it isn't valid.
 std::optional<std::string> hostOf(std::string_view authority)
 {
     if (const auto at = authority.rfind('@'); at != std::string_view::npos) authority.remove_prefix(at + 1);
@@ -68,7 +68,7 @@ std::optional<std::string> hostOf(std::string_view authority)
     return address ? std::optional(platform::lowerCased(host)) : std::nullopt;
 }
 
-/// The text of a link as it is recorded; empty where it is no link.
+/// The text of a link as it is recorded; empty for a text that isn't a link.
 std::string recordedLink(std::string_view link)
 {
     const auto components = deepLinkComponents(platform::trimmed(link));

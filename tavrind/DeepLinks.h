@@ -12,15 +12,15 @@
 
 namespace tavrin {
 
-/// A link taken apart (RFC 3986, 3), as far as it is of use to know where it leads: all of it ASCII, with characters
-/// that a URL can't hold percent-encoded, and without escapes of those that need none.
+/// The parts of a link (RFC 3986, 3) that say where it leads. All of it is ASCII: characters that a URL can't hold are
+/// percent-encoded, and characters that need no escape are not escaped.
 struct DeepLinkComponents {
     std::string scheme; ///< lower-case
-    std::string host;   ///< lower-case; empty where there is none
+    std::string host;   ///< lower-case; empty if the link has none
     std::string path;
 };
-/// Nothing for a text that isn't an absolute URL, has control characters or a port that is no number, or is longer than
-/// 64 KiB.
+/// Returns nothing for a text that isn't an absolute URL, has control characters or a port that is no number, or is
+/// longer than 64 KiB.
 [[nodiscard]] std::optional<DeepLinkComponents> deepLinkComponents(std::string_view link);
 /// Host and path, without a leading "www." and trailing "/".
 [[nodiscard]] std::string tavrin_normalizedURLStringForDeepLinkIngest(const DeepLinkComponents& link);

@@ -258,7 +258,7 @@ void DownloadManager::_downloadResource(const DownloadResource& resource, const 
 
 UrlRequest DownloadManager::_createDownloadRequest(const DownloadResource& resource, const Url& url) const
 {
-    // Without its file, an answer that it is current would be of no use.
+    // Without the file, a 304 would be of no use.
     const std::string version = _fileExists(resource.identifier) ? _resourceVersion(resource) : "";
     UrlRequest request =
         _assembly.requestFactory->fileDownloadRequest(url, version, isLookupResource(resource.identifier));
@@ -357,7 +357,7 @@ void DownloadManager::_noteReceived(const std::string& identifier, const Value& 
 {
     _queue->assertOnQueue();
     const auto found = _resources.find(identifier);
-    if (found == _resources.end()) { // no longer in the bag, or to be fetched anew
+    if (found == _resources.end()) { // no longer in the bag, or forgotten for another place
         log().error("could not find resource for download identifier: {} url: {}", identifier, request.url.string());
         return logTaskError(fmt::format("can't find {}", identifier));
     }
@@ -366,7 +366,7 @@ void DownloadManager::_noteReceived(const std::string& identifier, const Value& 
     if (response.url != request.url)
         resource.redirectUrl = response.url;
     else if (response.statusCode == 200)
-        resource.redirectUrl.reset(); // but the copy that a 304 keeps is from where it was
+        resource.redirectUrl.reset(); // a 304 keeps the old copy, and with it where that came from
     log().log("{} url: {}", identifier, response.url.string());
     _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.resourcefilesfetched");
     _saveResources();

@@ -25,9 +25,9 @@ namespace tavrin {
 struct Assembly;
 class TAVBag;
 
-/// A resource's file was replaced: "identifier" (std::string) and "url" (std::filesystem::path, where it is).
+/// A resource's file was replaced: "identifier" (std::string) and "url" (std::filesystem::path, the file).
 inline constexpr const char* TAVFileDownloadCompletedNotification = "TAVFileDownloadCompletedNotification";
-/// A resource was deleted, or is to be fetched anew for another place: "identifier".
+/// A resource was deleted, or must be fetched again for another place: "identifier".
 inline constexpr const char* TAVFileDeletedNotification = "TAVFileDeletedNotification";
 
 /// What the download manager needs to know of lookup hints, from whoever installs them. Any thread.
@@ -35,19 +35,19 @@ class LookupResources {
 public:
     virtual ~LookupResources() = default;
     [[nodiscard]] virtual bool lookupEnabled() const = 0;
-    /// The version of the hints at a URL; none for a URL that tells none.
+    /// The version of the hints at a URL; nothing if the URL has none.
     [[nodiscard]] virtual std::optional<std::string> signatureFromURL(const platform::Url& url) const = 0;
 };
 
 /// Keeps a local copy of each resource file that the bag lists.
 ///
-/// Every bag cancels what is under way and gives each resource a reason to be downloaded (`downloadReason`), or none. A
-/// download starts 60 s after its reason came up (the user default "TAVDownloadDelay", if it is set), if that still
-/// holds then; reasons that come up meanwhile join it. The session has a day to carry it out, across restarts: a
-/// download of an earlier process goes on until there is a bag. The one on disk is such a bag too, so a restarted
-/// daemon that has one begins its downloads again; what had arrived by then is installed all the same. An answer of
-/// status 200 replaces the file in one step, 304 leaves it; only then is the resource's URL noted, so that a download
-/// that failed has its reason again with the next bag. A resource that the bag no longer lists is deleted.
+/// Every bag cancels the downloads that are under way and checks each resource for a reason to be downloaded
+/// (`downloadReason`). A download starts 60 s later (the user default "TAVDownloadDelay", if it is set), if the reason
+/// still holds; a bag that comes meanwhile updates its URL. The session has a day to carry it out, across restarts: a
+/// download of an earlier process goes on until there is a bag, which may be the one on disk; what has arrived by then
+/// is installed all the same. An answer of status 200 replaces the file in one step, 304 leaves it; only then is the
+/// resource's URL noted, so a download that failed has its reason again with the next bag. A resource that the bag no
+/// longer lists is deleted.
 ///
 /// Any thread.
 class DownloadManager : public platform::BackgroundSessionDelegate,
@@ -58,7 +58,7 @@ public:
     explicit DownloadManager(Assembly& assembly);
     ~DownloadManager() override;
 
-    /// Until this is called, lookups are taken for enabled, and their hints for unversioned.
+    /// Until this is called, lookups count as enabled, and their hints have no version.
     void setLookupResources(std::weak_ptr<LookupResources> lookupResources);
 
     /// What the last change left; never waits for one that is under way.
@@ -70,8 +70,8 @@ public:
         platform::FileHandle file;
         platform::Value attributes; ///< dictionary: "size" (bytes), "modified" and "created" (dates)
     };
-    /// A handle of its own for each call, which keeps reading the same file when it is replaced. A resource that isn't
-    /// there is error 404.
+    /// Returns a handle of its own for each call, which keeps reading the same file when that is replaced. Fails with
+    /// error 404 if the resource isn't there, and 500 if it can't be read.
     [[nodiscard]] platform::Result<Resource> fileHandleForResource(const std::string& identifier) const;
 
     // From the download session, on its delegate queue.

@@ -10,12 +10,12 @@
 
 namespace tavrin {
 
-/// What is known of a resource's file.
+/// A downloadable resource, and where its file came from.
 struct DownloadResource {
     std::string identifier;
-    /// As the bag had it when the file, or word that it is current, was received; none before that.
+    /// The bag's URL when the file was received or confirmed (304); nothing before that.
     std::optional<platform::Url> url;
-    /// Where that URL led, if elsewhere.
+    /// The final URL, if that URL redirected.
     std::optional<platform::Url> redirectUrl;
 
     bool operator==(const DownloadResource&) const = default;
@@ -23,8 +23,8 @@ struct DownloadResource {
 
 using DownloadResources = std::map<std::string, DownloadResource, std::less<>>;
 
-/// The table of resources as it is kept in the user defaults: identifier → {"url", "redirect_url"}. Reading leaves out
-/// identifiers and URLs that are none.
+/// The table of resources as it is kept in the user defaults: identifier → {"url", "redirect_url"}. Reading skips
+/// unknown identifiers and invalid URLs.
 [[nodiscard]] platform::Value valueOf(const DownloadResources& resources);
 [[nodiscard]] DownloadResources resourcesIn(const platform::Value& value);
 
@@ -33,7 +33,8 @@ using DownloadResources = std::map<std::string, DownloadResource, std::less<>>;
 /// Lookup hints: fetched again with every bag, while lookups are enabled, and with the location.
 [[nodiscard]] bool isLookupResource(std::string_view identifier);
 
-/// Why a resource that the bag has at `url` must be downloaded: "update", "missing" or "lookup"; none if it needn't.
+/// Why a resource that the bag has at `url` must be downloaded: "update", "missing" or "lookup"; nothing if it needn't
+/// be.
 [[nodiscard]] std::optional<std::string_view> downloadReason(const DownloadResource& resource, const platform::Url& url,
                                                              bool fileExists);
 

@@ -33,7 +33,8 @@ const platform::Log& log()
     return TavrinLogForCategory(kLogGeneral);
 }
 
-/// A resource that holds a list of texts under `key`; `name` is what logs call it. Empty where it can't be had.
+/// Reads a resource that holds a list of texts under `key`; `name` is for the log. Returns an empty list if it can't be
+/// read.
 DeepLinks::List fetchList(const DownloadManager& downloads, std::string_view resource, std::string_view key,
                           std::string_view name)
 {

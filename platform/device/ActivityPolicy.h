@@ -20,12 +20,13 @@ struct ActivityWindow {
     Duration due{};
     Duration gracePeriod{};
 };
-/// The moment to wake for: as many of the activities together as can be, none before it is due or after its grace, and
-/// the first not later than company makes worth while. Nothing without activities.
+/// When to wake: at the last due time that lies within every activity's grace, so that as many as possible run together
+/// and none before it is due. Nothing without activities.
 [[nodiscard]] std::optional<Duration> wakeTime(std::span<const ActivityWindow> windows);
 
-/// When an activity that is registered at `registered` is due: not before its delay, nor before what an earlier process
-/// left (`kept`), which is believed as far as the activity itself could have put it.
+/// When an activity that is registered at `registered` is first due: after its delay, and not before the time that an
+/// earlier process kept for it. `kept` counts for one interval at most, so that a damaged file can't put it off for
+/// long.
 [[nodiscard]] Duration firstDue(const ActivityCriteria& criteria, Duration registered, std::optional<Duration> kept);
 
 } // namespace platform

@@ -29,7 +29,7 @@ constexpr Duration kSoon = 5min;
 constexpr Duration kShortestInterval = 1s;
 constexpr Duration kLongest = std::chrono::hours(24 * 366);
 constexpr std::size_t kMaximumFile = 64u << 10;
-/// What is kept of an activity that nobody registers any more goes this long after it was due.
+/// The due time of an activity that nobody registers any more is removed this long after it.
 constexpr Duration kForgottenAfter = std::chrono::hours(24 * 60);
 
 ActivityCriteria sane(ActivityCriteria criteria)
@@ -40,8 +40,8 @@ ActivityCriteria sane(ActivityCriteria criteria)
     return criteria;
 }
 
-/// One call of a handler: the check-in, or one run. Told on when the run has ended, at the latest when nobody holds it
-/// any more.
+/// One call of a handler: the check-in, or one run. Calls `ended` when the run has ended, at the latest when its last
+/// holder lets go of it.
 class Call final : public Activity {
 public:
     using Ended = std::move_only_function<void(ActivityState)>;
@@ -99,7 +99,7 @@ private:
     Ended _ended;
 };
 
-/// All of it belongs to `_queue`.
+/// All non-const members are confined to `_queue`.
 class Core : public std::enable_shared_from_this<Core> {
 public:
     explicit Core(ActivityEnvironment environment)

@@ -53,16 +53,16 @@ public:
 /// one, and one whose criteria don't hold, again in five minutes. An activity that doesn't repeat is forgotten after
 /// its run.
 ///
-/// Due times are kept on disk under the identifier, as counts of `LivedTime` and before a run begins: a daemon that is
-/// started and killed often still runs its activities, and none more often, and leaps of the system clock neither hold
-/// back a run nor bring it forward. No activity runs earlier than its delay after its registration.
+/// Due times are kept on disk under the identifier, written before a run begins: a daemon that is started and killed
+/// often still runs its activities, and no more often. They are counts of `LivedTime`: setting the system clock neither
+/// delays a run nor brings it forward. No activity runs earlier than its delay after its registration.
 ///
 /// Nothing wakes but a timer for the next activity that is due. Handlers are called on a worker thread. Any thread.
 class ActivityScheduler {
 public:
     using Handler = std::function<void(const std::shared_ptr<Activity>&)>;
     virtual ~ActivityScheduler() = default;
-    /// Registers, in place of an activity of that name.
+    /// Registers the activity, in place of one of that name.
     virtual void registerActivity(const std::string& identifier, ActivityCriteria criteria, Handler handler) = 0;
     /// Forgets the activity and its due time; a run under way ends on its own.
     virtual void unregister(const std::string& identifier) = 0;

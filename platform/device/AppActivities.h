@@ -26,7 +26,7 @@ struct AppActivity {
 /// It is opened for each call, and nothing is kept of it in between. Any thread.
 class AppActivities {
 public:
-    /// Those that began earlier are forgotten when one is added.
+    /// Activities that began earlier than this are removed when one is added.
     static constexpr auto kKeptFor = std::chrono::days(7);
 
     /// `directory` holds the database, which need not be there. `files` must outlive this.
@@ -34,14 +34,14 @@ public:
         : _files(files), _path(directory / "app-activities.db")
     {}
 
-    /// The activities that began from `from` to `to`, both included, by date; those of a second in the order in which
-    /// they were added. The first `limit` of them. Reading waits for nobody: a database that isn't there, is locked,
-    /// damaged or of another make is an error at once.
+    /// Returns the first `limit` activities that began from `from` to `to`, both included, by date; those of the same
+    /// second in the order in which they were added. Waits for nobody: fails at once if the database isn't there
+    /// (ENOENT), is locked or damaged, or has another version.
     [[nodiscard]] Result<std::vector<AppActivity>> queryAppActivitiesAfterDate(Date from, Date to,
                                                                                std::size_t limit) const;
 
-    /// Adds one, and makes the database and its directory where there are none. Waits up to a second for others that
-    /// add. An error for an activity that would be forgotten at once.
+    /// Adds one; makes the database and its directory if they are missing. Waits up to a second for others that add.
+    /// Fails for an activity older than `kKeptFor`.
     [[nodiscard]] Result<void> add(const AppActivity& activity, Date now) const;
 
 private:

@@ -27,7 +27,7 @@ constexpr std::size_t kMaximumCounters = 4096;
 /// How many make way at once, so that finding them costs little for each.
 constexpr std::size_t kMakeWay = kMaximumCounters / 8;
 constexpr std::size_t kMaximumKeyLength = 512;
-/// As many counters as there may be, with keys of escapes ("\u0001") and numbers of 20 digits, can be read back.
+/// Enough for the largest file that is written: all keys made of escapes ("\u0001"), all numbers of 20 digits.
 constexpr std::size_t kMaximumSize = kMaximumCounters * (6 * kMaximumKeyLength + 32);
 
 struct KeyHash {

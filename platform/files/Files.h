@@ -31,9 +31,9 @@ public:
     virtual ~AppendFile() = default;
     /// Bytes in the file.
     [[nodiscard]] virtual std::uint64_t size() const = 0;
-    /// Adds the bytes of `parts` (four at most), one behind the other, in one go. After a failure the file is as long
-    /// as it was before: what was written of a record is cut off again, and if that fails too nothing more is added.
-    /// Not synced.
+    /// Adds the bytes of `parts` (four at most) at the end, in one write. After a failure the file is as long as
+    /// before: what was written of a record is cut off, and if that fails too every later call fails with EIO. Not
+    /// synced.
     [[nodiscard]] virtual Result<void> append(std::initializer_list<std::string_view> parts) = 0;
 };
 
@@ -45,16 +45,16 @@ class FileSystem {
 public:
     virtual ~FileSystem() = default;
 
-    /// The whole file, at most `maximumSize` bytes (a larger one is an error, EFBIG).
+    /// Returns the whole file. Fails with EFBIG if it is larger than `maximumSize` bytes.
     [[nodiscard]] virtual Result<Bytes> read(const std::filesystem::path& path, std::size_t maximumSize) = 0;
     /// Publishes a file whole: writes a temporary beside it, syncs, renames it over `path`, syncs the directory.
-    /// A failure leaves the old file as it was, or, where only the directory couldn't be synced, the new one that may
-    /// be gone after a power cut. Mode 0600.
+    /// A failure leaves the old file as it was, or, if only the directory couldn't be synced, the new one, which a
+    /// power cut may undo. Mode 0600.
     [[nodiscard]] virtual Result<void> writeAtomically(const std::filesystem::path& path,
                                                        std::string_view contents) = 0;
-    /// Publishes the file `source` as `path`, in one step: it is synced and renamed, or, on another file system, copied
-    /// beside `path` first. Who has the old file open keeps reading that. A failure leaves the old file as it was;
-    /// `source` is gone only after a success. Mode 0600.
+    /// Publishes the file `source` as `path`, in one step: syncs and renames it, or, from another file system, copies
+    /// it beside `path` first. Whoever has the old file open keeps reading that. A failure leaves the old file and
+    /// `source` as they were. Mode 0600.
     [[nodiscard]] virtual Result<void> replace(const std::filesystem::path& path,
                                                const std::filesystem::path& source) = 0;
     /// Publishes a copy of what `source` holds as `path`, whole, like `writeAtomically`. Fails with EFBIG if that is
@@ -68,20 +68,20 @@ public:
     [[nodiscard]] virtual Result<FileHandle> create(const std::filesystem::path& path) = 0;
     /// Returns once the file's contents and its name outlive a power cut.
     [[nodiscard]] virtual Result<void> sync(const std::filesystem::path& path) = 0;
-    /// Makes the directory and its parents, those made with mode 0700. One that is there already is fine.
+    /// Makes the directory and its missing parents, with mode 0700. Does nothing if it is there already.
     [[nodiscard]] virtual Result<void> createDirectories(const std::filesystem::path& path) = 0;
     [[nodiscard]] virtual Result<FileInfo> info(const std::filesystem::path& path) = 0;
-    /// Removes a file; one that isn't there is an error (ENOENT).
+    /// Removes a file. Fails with ENOENT if it isn't there.
     [[nodiscard]] virtual Result<void> remove(const std::filesystem::path& path) = 0;
     /// Removes a directory with everything in it. One that isn't there is fine.
     [[nodiscard]] virtual Result<void> removeDirectory(const std::filesystem::path& path) = 0;
     /// The names in a directory, in no order, without "." and "..".
     [[nodiscard]] virtual Result<std::vector<std::string>> list(const std::filesystem::path& path) = 0;
     [[nodiscard]] virtual Result<FileHandle> openForReading(const std::filesystem::path& path) = 0;
-    /// Makes a new, empty file, mode 0600, and opens it; one that is there already is an error (EEXIST).
+    /// Makes an empty file, mode 0600, and opens it. Fails with EEXIST if it is there already.
     [[nodiscard]] virtual Result<std::unique_ptr<AppendFile>> createForAppending(const std::filesystem::path& path) = 0;
-    /// Locks a file, made where it is missing, against other processes, for as long as the handle lives. An error where
-    /// another has it (EWOULDBLOCK).
+    /// Locks a file against other processes for as long as the handle lives; makes the file if it is missing. Never
+    /// waits: fails with EWOULDBLOCK while another process has the lock.
     [[nodiscard]] virtual Result<FileHandle> lock(const std::filesystem::path& path) = 0;
     /// Takes a directory for this process: makes it if it is missing, sets its mode to 0700, and locks the file "lock"
     /// in it for as long as the handle lives. Fails for a link (ENOTDIR), for another user's (EPERM), and while another
@@ -89,8 +89,9 @@ public:
     [[nodiscard]] virtual Result<FileHandle> takeDirectory(const std::filesystem::path& path) = 0;
     /// Opens a database as `Sqlite::open` does.
     [[nodiscard]] virtual Result<Sqlite> openDatabase(const std::filesystem::path& path, Sqlite::Access access) = 0;
-    /// A new, empty file in memory, for reading and writing: it goes with its last user. Without a name, for making one
-    /// in a directory and removing it may take a file system's journal a quarter of a millisecond.
+    /// Makes an empty file in memory, without a name, for reading and writing; it is freed with its last handle.
+    /// (Making and removing one in a directory was measured at a quarter of a millisecond, for the file system's
+    /// journal.)
     [[nodiscard]] virtual Result<FileHandle> createTemporary() = 0;
 };
 
@@ -109,7 +110,7 @@ void makePrivate(const std::filesystem::path& directory);
 /// for a file that nobody shortens while it is in use: reading beyond its end kills the process.
 [[nodiscard]] Result<Bytes> mapFile(const FileHandle& file, std::size_t size);
 
-/// The user's directories. Made on first use by whoever writes there, never at start-up.
+/// The user's directories. Whoever writes to one makes it; start-up makes none.
 struct Directories {
     std::filesystem::path caches;                  ///< $XDG_CACHE_HOME, else ~/.cache
     std::filesystem::path config;                  ///< $XDG_CONFIG_HOME, else ~/.config

@@ -137,7 +137,7 @@ Result<void> Sqlite::run(std::string_view statement, std::initializer_list<Param
     return {};
 }
 
-/// Out of the kept ones, for a callback may run the same statement; an empty handle for a text that is none.
+/// Removed from the cache: a callback may run the same statement. Empty if the text is no statement.
 Sqlite::Statements::node_type Sqlite::takeStatement(std::string_view text)
 {
     auto found = _statements.find(text);

@@ -32,7 +32,7 @@ public:
     class Row {
     public:
         [[nodiscard]] bool isNull(int column) const;
-        [[nodiscard]] std::int64_t integer(int column) const; ///< 0 for what is none
+        [[nodiscard]] std::int64_t integer(int column) const; ///< 0 for null and for text that isn't a number
         [[nodiscard]] std::string_view text(int column) const;
 
     private:
@@ -41,7 +41,7 @@ public:
         sqlite3_stmt* _statement;
     };
 
-    /// With whom a database is shared.
+    /// Who else uses the database.
     enum class Access {
         Exclusive, ///< with nobody: others are locked out while it is open (error SQLITE_BUSY at the first access)
         Shared,    ///< with others that change it; waits for them, a second at most

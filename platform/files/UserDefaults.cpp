@@ -39,7 +39,7 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
     std::unique_ptr<FileWatch> watch;
     int lockAttempts = 0; // in vain, since the last write; write queue only
 
-    /// What the file has; nothing where it is missing, an error where it can't be read or is no JSON object.
+    /// Returns what the file has, nothing if it is missing. Fails if it can't be read or isn't a JSON object.
     Result<Dictionary> readFile() const
     {
         auto bytes = files->read(path, kMaximumSize);

@@ -94,7 +94,7 @@ private:
     Value _timing; // under the mutex
 };
 
-/// Tells the delegate of an upload's progress: of the latest, where they come faster than it listens.
+/// Tells the delegate of an upload's progress. Reports that come faster than it listens are merged into the latest.
 class Progress : public std::enable_shared_from_this<Progress> {
 public:
     Progress(std::weak_ptr<BackgroundSessionDelegate> delegate, std::shared_ptr<Queue> queue,
@@ -120,7 +120,7 @@ private:
     std::atomic<bool> _queued = false;
 };
 
-/// All of it belongs to `_queue` but what is const.
+/// All non-const members are confined to `_queue`.
 class Session final : public BackgroundSession, public std::enable_shared_from_this<Session> {
 public:
     Session(const BackgroundEnvironment& environment, BackgroundSessionConfiguration configuration,
@@ -261,10 +261,10 @@ private:
     const std::shared_ptr<UrlSession> _loads;
 
     std::unique_ptr<BackgroundStore> _store;
-    std::optional<Error> _storeError; // where there can't be one
+    std::optional<Error> _storeError; // if there can't be a store
     LivedTime _time;
     std::map<std::uint64_t, Entry> _entries;
-    std::vector<std::uint64_t> _leftOver; ///< are over, and could not be removed from the store yet
+    std::vector<std::uint64_t> _leftOver; ///< ended tasks that could not be removed from the store yet
     std::uint64_t _bodyBytes = 0;
     BackgroundAgenda _agenda; // of the resumed tasks that have not ended
     std::uint64_t _lastAttempt = 0;
@@ -325,7 +325,7 @@ void Session::_takeUp(BackgroundStore::Contents contents)
 {
     _time = LivedTime(_environment.clock, contents.time);
     const Duration now = _time.now();
-    // A time beyond what can have been written would stick.
+    // A time beyond what this class writes would hold the host for ever.
     for (const auto& [host, until] : contents.holds) _agenda.hold(host, std::min(until, now + kLongestHold));
     for (StoredTask& stored : contents.tasks) {
         if (!stored.resumed && !stored.outcome) {
@@ -334,7 +334,7 @@ void Session::_takeUp(BackgroundStore::Contents contents)
         }
         stored.deadline = std::min(stored.deadline, now + kLongestResourceTimeout);
         stored.notBefore = std::min(stored.notBefore, now + kLongestHold);
-        // Whoever was told of a download may have moved its file away and been killed then.
+        // The owner may have taken the file, and been killed before the task was forgotten: download it again.
         if (!stored.isUpload && stored.outcome && !stored.outcome->error && !_store->hasDownload(stored.identifier))
             stored.outcome.reset();
 
@@ -452,7 +452,7 @@ void Session::_hold(const UrlRequest& request, const UrlResponse& response)
     const auto wait = retryAfter(*field, _environment.clock.wallNow());
     if (!wait || *wait <= Duration::zero()) return;
     const Duration until = _time.now() + *wait;
-    // The service behind a redirect is asked through both.
+    // After a redirect, both hosts lead to the service that asked for the wait.
     for (const std::string& host : std::set<std::string>{request.url.host(), response.url.host()}) {
         _agenda.hold(host, until);
         if (auto saved = _store->saveHold(host, until, _time.mark()); !saved)

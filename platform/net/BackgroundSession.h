@@ -18,8 +18,9 @@ class FileSystem;
 class NetworkStatus;
 class Queue;
 
-/// A transfer that outlives the process; see `BackgroundSession`. Any thread but the run loop's: `resume`, `cancel` and
-/// `setNote` write to disk.
+/// A transfer that outlives the process; see `BackgroundSession`. The session keeps a task from `resume` until it has
+/// ended; before that a task whose last owner lets go of it is removed. Any thread but the run loop's: `resume`,
+/// `cancel` and `setNote` write to disk.
 class BackgroundTask : public UrlTask {
 public:
     /// What the owner wants to remember of the task, kept with it: a small JSON value, 128 KiB of text at most (a
@@ -30,7 +31,7 @@ public:
     [[nodiscard]] virtual bool isUpload() const = 0;
 };
 
-/// Is told how the transfers go, on the session's delegate queue.
+/// Hears how the transfers go, on the session's delegate queue.
 class BackgroundSessionDelegate {
 public:
     virtual ~BackgroundSessionDelegate() = default;
@@ -50,20 +51,21 @@ public:
                                  const std::optional<UrlResponse>& response, const std::optional<Error>& error) = 0;
     /// No task is left of those that the session knew.
     virtual void sessionDidFinishEvents() {}
-    /// The session's store can't be opened, or is another process's: it works in a temporary directory, and tasks end
-    /// with the process. Where that isn't possible either, new tasks are errors.
+    /// The session's store can't be opened, or belongs to another process. The session works in a temporary directory,
+    /// and its tasks end with the process. If that isn't possible either, making a task fails.
     virtual void sessionDidBecomeInvalid(const Error&) {}
 };
 
 struct BackgroundSessionConfiguration {
     std::string identifier;    ///< names the session's store; one session of that name for each user
     bool allowsMetered = true; ///< else tasks wait while the network is metered
-    /// Without anything sent or received for this long an attempt ends, and another is made later.
+    /// After this long without anything sent or received an attempt ends, and another is made later.
     Duration requestTimeout = std::chrono::seconds(60);
-    /// From its resume on, waiting included, a task may take this long; then it ends with kUrlTimedOut.
+    /// A task that hasn't ended this long after its resume, waiting included, ends with kUrlTimedOut.
     Duration resourceTimeout = std::chrono::hours(24 * 7);
     std::size_t maximumResponseSize = 64u << 20; ///< bytes of a download, or of an upload's answer
-    /// Tasks kept at once, and the bytes of their bodies. Past either a new task is an error.
+    /// Limits on the tasks kept at once and on the bytes of their bodies. Past either, making a task fails with
+    /// kUrlTooLarge.
     std::size_t maximumTasks = 10'000;
     std::uint64_t maximumBodyBytes = 256u << 20;
     unsigned parallelTransfers = 2;
@@ -72,24 +74,25 @@ struct BackgroundSessionConfiguration {
 
 /// Uploads and downloads that survive the process. Any thread but the run loop's: making a task writes to disk.
 ///
-/// A task is on disk, with its own copy of its body, before it is handed out; nothing moves before `resume()`. Tasks
-/// resumed by an earlier process go on when the session is made anew, and report to the delegate then; tasks that were
-/// made and never resumed are dropped at that time, their bodies with them.
+/// A task is on disk, with its own copy of its body, before it is handed out. Nothing is transferred before `resume()`.
+/// When the next process makes a session of the same name, the tasks that were resumed go on and report to its
+/// delegate; tasks that were never resumed are dropped, with their bodies.
 ///
 /// A resumed task waits while the network is absent (and metered, where that isn't allowed). An attempt that fails
-/// below HTTP is made again after growing, jittered delays, until the resource time-out; what can't get better (a bad
+/// below HTTP is repeated after growing, jittered delays, until the resource time-out; what can't get better (a bad
 /// URL, a forbidden redirect, an answer too large) ends the task with its error. An HTTP status always ends the task;
-/// where it comes with Retry-After (RFC 9110, 10.2.3; a day at most), the session's other tasks to that host wait.
+/// if it comes with Retry-After (RFC 9110, 10.2.3; a day at most), the session's other tasks to that host wait.
 ///
-/// An attempt that was under way when the process died is made again, with the same body: a service may see a body
-/// twice, never a part of it as the whole. How a task ended is on disk before its owner is told.
+/// An attempt that was under way when the process died is repeated with the same body: a service may see a body twice,
+/// never a part of it as the whole. How a task ended is on disk before its owner is told.
 ///
 /// The resource time-out is of lived time (`LivedTime`): suspend and days without the process count, leaps of the
 /// system clock don't. Destroying the session stops its transfers, for the next session of that name to take up.
 class BackgroundSession {
 public:
     virtual ~BackgroundSession() = default;
-    /// Uploads the contents of `body` (not followed where it is a link), which the caller may remove at once.
+    /// Uploads the contents of `body`, which must not be a link and which the caller may remove at once. Fails with
+    /// kUrlBadUrl, kUrlTooLarge, or the error of the disk.
     [[nodiscard]] virtual Result<std::shared_ptr<BackgroundTask>> uploadTask(UrlRequest request,
                                                                              const std::filesystem::path& body) = 0;
     [[nodiscard]] virtual Result<std::shared_ptr<BackgroundTask>> downloadTask(UrlRequest request) = 0;
@@ -102,15 +105,15 @@ public:
 class BackgroundSessions {
 public:
     virtual ~BackgroundSessions() = default;
-    /// `delegate` is told of the transfers on `delegateQueue`, a serial queue; those of an earlier process are taken up
-    /// now. Where the store can't be opened, the session's tasks end with the process and the delegate is told. The
-    /// store is opened on a worker, and made with the first task.
+    /// Makes a session, which takes up the transfers of an earlier process. `delegate` hears of them on
+    /// `delegateQueue`, a serial queue. The store is opened on a worker, and made with the first task; a failure of
+    /// that is told to the delegate.
     [[nodiscard]] virtual std::shared_ptr<BackgroundSession> make(BackgroundSessionConfiguration configuration,
                                                                   std::weak_ptr<BackgroundSessionDelegate> delegate,
                                                                   std::shared_ptr<Queue> delegateQueue) = 0;
 };
 
-/// What background sessions work with; all of it must outlive them.
+/// What background sessions work with. All of it must outlive them.
 struct BackgroundEnvironment {
     FileSystem& files;
     UrlLoader& loader;
@@ -118,7 +121,7 @@ struct BackgroundEnvironment {
     Clock& clock;
     Executor& executor;
     std::filesystem::path directory; ///< holds a directory for each session; made when there is something to keep
-    std::filesystem::path temporary; ///< where a session works whose store can't be opened
+    std::filesystem::path temporary; ///< for a session whose store can't be opened
 };
 
 [[nodiscard]] std::unique_ptr<BackgroundSessions> makeBackgroundSessions(BackgroundEnvironment environment);

@@ -25,7 +25,7 @@ constexpr std::string_view kDownloadSuffix = ".download";
 /// Of a copy that a kill left half made.
 constexpr std::string_view kUnfinishedSuffix = ".tmp";
 constexpr std::string_view kTemporaryPrefix = "background-transfers-";
-/// A store with other tables is begun anew. Times are nanoseconds of the lived time.
+/// A store with other tables is replaced by an empty one. Times are nanoseconds of lived time.
 constexpr std::array kSchema{
     "CREATE TABLE task (identifier INTEGER PRIMARY KEY AUTOINCREMENT, upload INTEGER NOT NULL, request TEXT NOT NULL,"
     " requestBody TEXT NOT NULL, bodySize INTEGER NOT NULL, note TEXT, resumed INTEGER NOT NULL,"
@@ -103,7 +103,7 @@ StoredTask::Outcome outcomeOf(const Value& value)
     return outcome;
 }
 
-/// A row that can't be read as a task, as after someone edited it, is nothing.
+/// Returns nothing for a row that isn't a task, for example because someone edited it.
 std::optional<StoredTask> taskOf(const Sqlite::Row& row)
 {
     StoredTask task{.identifier = static_cast<std::uint64_t>(row.integer(0)),

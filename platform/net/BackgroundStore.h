@@ -18,7 +18,7 @@ namespace platform {
 
 /// A background task, as it is kept on disk. Times are counts of the store's `LivedTime`.
 struct StoredTask {
-    /// How it ended; its owner has not been told yet.
+    /// How it ended. Kept until its owner has been told.
     struct Outcome {
         std::optional<UrlResponse> response;
         std::optional<Error> error;
@@ -39,8 +39,8 @@ struct StoredTask {
 /// The tasks of one background session on disk: a directory (0700) with a database of the tasks and one file (0600) for
 /// each body. What a call reports done outlives a kill and a power cut. One thread at a time.
 ///
-/// The directory belongs to one process, by a lock. A damaged database is logged and begun anew. Files that belong to
-/// no task, left by a kill at the wrong moment, are removed when the store is opened.
+/// A lock gives the directory to one process. A database that is damaged or has other tables is logged and replaced by
+/// an empty one. Files that belong to no task, which a kill left, are removed when the store is opened.
 class BackgroundStore {
 public:
     struct Contents {

@@ -21,9 +21,9 @@ using Stored = std::shared_ptr<const StoredResponse>;
 
 /// Of a directory that can't be used.
 constexpr Duration kRetryDelay = std::chrono::minutes(1);
-/// One answer gets this part of a capacity at most, lest it drive all others out.
+/// An answer takes at most this part of a capacity, so that it can't evict all others.
 constexpr std::size_t kLargestPart = 10;
-/// Bytes of what waits to be written, lest a slow disk fill the memory: what comes meanwhile isn't kept on disk.
+/// Bytes that may wait to be written. Past it nothing more is kept on disk, so that a slow disk can't fill the memory.
 constexpr std::size_t kMostWaiting = 64u << 20;
 
 std::size_t sizeOf(const std::string& key, const StoredResponse& stored)
@@ -47,7 +47,7 @@ public:
         found->second->used = true;
         return found->second->stored;
     }
-    /// Replaces an earlier one; where it is too large there is none from then on.
+    /// Replaces an earlier answer. One that is too large isn't kept, and the earlier one is removed all the same.
     void put(const std::string& key, Stored stored)
     {
         remove(key);
@@ -209,7 +209,7 @@ private:
             noteUses();
             auto evicted = store->put(key, stored);
             if (!evicted && Sqlite::isDamage(evicted.error())) {
-                failed(evicted.error()); // begins it anew
+                failed(evicted.error()); // replaces the index by an empty one
                 if (store) evicted = store->put(key, stored);
             }
             if (evicted) {

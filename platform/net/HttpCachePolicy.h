@@ -39,7 +39,7 @@ enum class CacheUse {
 /// Requests with credentials, for a part, with a body or with conditions of their own have nothing to do with it.
 [[nodiscard]] CacheUse cacheUse(const UrlRequest& request);
 
-/// The request's values of the fields that the answer's Vary names, one line each; none for "*", which no request
+/// The request's values of the fields that the answer's Vary names, one line each; nothing for "*", which no request
 /// matches.
 [[nodiscard]] std::optional<std::string> selectingFields(const UrlResponse& response, const UrlRequest& request);
 
@@ -63,7 +63,7 @@ enum class Reuse { Answer, Confirm, None };
 [[nodiscard]] UrlRequest confirmationRequest(const StoredResponse& stored, UrlRequest request);
 /// Whether an answer of status 304 is about the kept answer.
 [[nodiscard]] bool confirms(const UrlResponse& notModified, const StoredResponse& stored);
-/// The kept answer with what the confirmation says anew.
+/// The kept answer, updated by what the confirmation says.
 [[nodiscard]] StoredResponse confirmed(StoredResponse stored, const UrlResponse& notModified, Date requested,
                                        Date received);
 

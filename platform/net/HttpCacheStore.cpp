@@ -23,9 +23,10 @@ constexpr std::string_view kBodySuffix = ".body";
 constexpr std::string_view kUnfinishedSuffix = ".tmp";
 /// What an entry takes beside its texts and body, about.
 constexpr std::uint64_t kEntrySize = 1024;
-/// Uses are saved with the next change, and when there are so many.
+/// Uses are saved with the next change, or when this many wait.
 constexpr std::size_t kMaximumUnsavedUses = 256;
-/// Mappings are kept, for making one may cost many times what is read through it; so many, and bytes of all of them.
+/// Mappings are cached, at most this many and with at most these bytes together: creating one can cost far more than
+/// reading it.
 constexpr std::size_t kMaximumMappings = 64;
 constexpr std::size_t kMostMapped = 16u << 20;
 

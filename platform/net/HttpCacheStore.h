@@ -18,35 +18,35 @@ namespace platform {
 /// Kept answers on disk: a directory (0700) with an index, a SQLite database that also has the small bodies, and one
 /// file (0600) for each of the others. One thread at a time.
 ///
-/// The directory belongs to one process, by a lock. Nothing is synced: what a power cut leaves is found to be damaged,
-/// or missing, when it is read. What is damaged is logged and dropped, be it one answer or the index with all of them.
-/// Files that belong to no answer are removed when the directory is opened.
+/// A lock gives the directory to one process. Nothing is synced: an answer that a power cut damaged is recognised by
+/// its digest when it is read. What is damaged is logged and dropped, one answer or the index with all of them. Files
+/// that belong to no answer are removed when the directory is opened.
 class HttpCacheStore {
 public:
     struct Limits {
-        std::uint64_t capacity = 0;        ///< bytes of all answers; past it those go that were used least recently
-        std::size_t minimumMappedSize = 0; ///< bodies of so many bytes are files of their own
+        std::uint64_t capacity = 0;        ///< bytes of all answers; past it the least recently used are removed
+        std::size_t minimumMappedSize = 0; ///< bodies of at least so many bytes are files of their own
     };
 
     /// Opens or makes it; `files` must outlive it. Fails with EWOULDBLOCK while another process has it open.
     [[nodiscard]] static Result<std::unique_ptr<HttpCacheStore>>
     open(FileSystem& files, const std::filesystem::path& directory, const Limits& limits);
-    /// Notes what was used.
+    /// Saves what was used.
     ~HttpCacheStore();
 
-    /// Of all answers, in no order.
+    /// The keys of all answers, in no order.
     [[nodiscard]] Result<std::vector<std::string>> keys();
-    /// Null where there is none, or it is damaged. An answer whose URL is `likely`, too, needn't parse it.
+    /// Returns null if there is none, or it is damaged. `likely` saves parsing the answer's URL if that is the same.
     [[nodiscard]] Result<std::shared_ptr<const StoredResponse>> find(const std::string& key, const Url& likely = {});
-    /// Keeps the answer in place of an earlier one; answers the keys of those that had to go for it.
+    /// Keeps the answer in place of an earlier one; returns the keys of those that were evicted for it.
     [[nodiscard]] Result<std::vector<std::string>> put(const std::string& key, const StoredResponse& stored);
     [[nodiscard]] Result<void> remove(const std::string& key);
-    /// It was used elsewhere.
+    /// Notes a use of the answer that this store didn't see.
     void noteUse(const std::string& key);
 
-    /// False once someone took the directory or the index away.
+    /// Returns false once someone has removed the directory or the index.
     [[nodiscard]] bool isInPlace() const;
-    /// Removes all and begins with an empty index.
+    /// Removes everything and makes an empty index.
     [[nodiscard]] Result<void> beginAnew();
 
 private:

@@ -14,8 +14,8 @@
 
 namespace platform {
 
-/// What a device has told of its user in the last day, and the secret that hides it: a value, as it is kept on disk
-/// (docs/formats.md).
+/// How many reports a device has made in the last day, and the secret that hides their contents: a value, as it is kept
+/// on disk (docs/formats.md).
 ///
 /// The ledger counts lived time (`LivedTime`). So a clock that was set back brings no new budget, and a debit that was
 /// made while the clock ran years ahead doesn't use up the budget of those years.

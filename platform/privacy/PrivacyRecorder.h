@@ -17,9 +17,9 @@ namespace platform {
 class Clock;
 class FileSystem;
 
-/// Fills the bytes; false where there is no randomness, and then nothing may rely on them. Any thread.
+/// Fills the bytes with randomness; returns false, and leaves them unspecified, if there is none. Any thread.
 using RandomBytes = std::function<bool(std::span<std::uint8_t>)>;
-/// From the cryptographic generator.
+/// The cryptographic generator of OpenSSL.
 [[nodiscard]] bool systemRandomBytes(std::span<std::uint8_t> bytes);
 
 /// Domain of the recorder's own errors.
@@ -27,17 +27,18 @@ inline constexpr std::string_view kPrivacyErrorDomain = "Privacy";
 inline constexpr std::int64_t kPrivacyBudgetExhausted = 1;
 inline constexpr std::int64_t kPrivacyNoRandomness = 2;
 
-/// Notes texts in a way that tells much of many devices and little of this one (docs/privacy.md).
+/// Records texts by randomised response: many devices' reports together tell much, one device's little
+/// (docs/privacy.md).
 ///
 /// Its directory has two files (0600), each replaced whole: "ledger", which must not leave the device, and
-/// "reports.json", which may. Keys and texts are in neither: a report is noise around one bit, to which both are
-/// hashed. The reports of 30 days are kept; nothing here sends them anywhere.
+/// "reports.json", which may. Neither has keys or texts: a report is noise around one bit, to which both are hashed.
+/// The reports of 30 days are kept; nothing here sends them anywhere.
 ///
-/// The budget is the device's, whatever the keys. It is debited on disk before a report is written: a kill or a failure
-/// in between costs the reports. Where the ledger is damaged or can't be had nothing is recorded, until someone removes
-/// it, which makes a new device of this one.
+/// There is one budget for the device, whatever the keys. It is debited on disk before a report is written: a kill or a
+/// failure in between loses the reports. While the ledger is damaged or unreadable nothing is recorded. Removing it
+/// makes the device a new one: a new secret and a new budget.
 ///
-/// One thread at a time. Of several processes one records; the others fail meanwhile (EWOULDBLOCK).
+/// One thread at a time. One process records at a time; `record` fails in the others meanwhile (EWOULDBLOCK).
 class PrivacyRecorder {
 public:
     PrivacyRecorder(FileSystem& files, Clock& clock, std::filesystem::path directory,
