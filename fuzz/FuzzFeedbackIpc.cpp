@@ -99,9 +99,9 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
     for (const auto& session : device.takeSessions()) {
         for (const auto& event : session->feedbacks()) {
             (void)event->description();
-            const auto* custom = dynamic_cast<const ZRCustomFeedback*>(event->feedback.get());
-            const auto* end = dynamic_cast<const TavrinSessionEndFeedback*>(event->feedback.get());
-            if (!custom && !end) kept.push_back(platform::archive(*event->feedback));
+            const auto* custom = dynamic_cast<const ZRCustomFeedback*>(event->feedback().get());
+            const auto* end = dynamic_cast<const TavrinSessionEndFeedback*>(event->feedback().get());
+            if (!custom && !end) kept.push_back(platform::archive(*event->feedback()));
         }
         fuzz::checkUpload(*session);
     }

@@ -1,11 +1,22 @@
 #pragma once
 
+#include <array>
 #include <cstdint>
+#include <string_view>
 
-/// The enumerations of search and feedback records. Values are positions: clients send the number, the service reads
-/// the name at that position, so order is format and new values go to the end. A record read from outside may hold a
-/// number beyond the last value; it is kept as it is.
+/// The enumerations of search and feedback records, each with its texts.
+///
+/// Clients send the number of a value, the service reads the text at that position: numbers and texts are format, and
+/// new values go to the end. A record from outside may hold a number that no enumerator has; it is kept.
 namespace tavrin {
+
+/// The texts of an enumeration, by value.
+template <class E> inline constexpr std::array<std::string_view, 0> kTexts{};
+
+template <class... Text> consteval std::array<std::string_view, sizeof...(Text)> texts(Text... text)
+{
+    return {text...};
+}
 
 /// What made the search view appear.
 enum class SearchViewAppearTrigger : std::int64_t {
@@ -37,6 +48,13 @@ enum class SearchViewAppearTrigger : std::int64_t {
     UnlockDevice,
     DidEnterForeground,
 };
+template <>
+inline constexpr auto kTexts<SearchViewAppearTrigger> =
+    texts("unknown", "swipe_down", "today_view", "lock_screen", "breadcrumb", "keyboard_shortcut",
+          "mouse_click_on_menu", "app_launch", "new_tab", "tap_to_input", "new_window", "click", "tab_switch", "orb",
+          "contextual_menu", "lookup_hint_tap", "lookup_tap", "swipe_up", "swipe_left", "swipe_right",
+          "start_composing", "find_popular_items", "pull_down_home_screen", "notification_center", "partial_pull_down",
+          "unlock_device", "did_enter_foreground");
 
 /// What made the search view disappear.
 enum class SearchViewDisappearTrigger : std::int64_t {
@@ -66,9 +84,17 @@ enum class SearchViewDisappearTrigger : std::int64_t {
     DidEnterBackground,
     GoToSite,
 };
+template <>
+inline constexpr auto kTexts<SearchViewDisappearTrigger> =
+    texts("unknown", "killed", "home_button", "task_switcher", "cancel", "escape", "close_window_by_keyboard",
+          "close_window_by_mouse", "minimize_window_by_keyboard", "minimize_window_by_mouse", "switched_to_other_app",
+          "quit_app", "lock_button", "click_notification_banner", "phone_call", "lost_focus", "done", "swipe_down",
+          "swipe_up", "swipe_left", "swipe_right", "share_button", "device_idle", "did_enter_background", "go_to_site");
 
 /// What made a card disappear.
 enum class CardViewDisappearTrigger : std::int64_t { Unknown, Back, Swipe, Pop, Done, Replaced };
+template <>
+inline constexpr auto kTexts<CardViewDisappearTrigger> = texts("unknown", "back", "swipe", "pop", "done", "replaced");
 
 /// What made a search start.
 enum class StartSearchTrigger : std::int64_t {
@@ -93,6 +119,11 @@ enum class StartSearchTrigger : std::int64_t {
     Correction,
     Warm,
 };
+template <>
+inline constexpr auto kTexts<StartSearchTrigger> =
+    texts("unknown", "new_character", "ime_commit", "backspace", "voice_search", "dictation", "copy_and_paste",
+          "drag_and_drop", "suggestion", "prefetch", "partial_suggestion", "lookup", "cross_button", "show_more",
+          "card", "image_load", "bag", "unlock_device", "correction", "warm");
 
 /// Whom a network request goes to.
 enum class EndpointType : std::int64_t {
@@ -110,9 +141,15 @@ enum class EndpointType : std::int64_t {
     TavrinCard,
     TavrinWarm,
 };
+template <>
+inline constexpr auto kTexts<EndpointType> =
+    texts("unknown", "tavrin", "google", "yahoo", "bing", "duckduckgo", "tavrin_search", "tavrin_image", "yandex",
+          "baidu", "tavrin_bag", "tavrin_card", "tavrin_warm");
 
 /// How the words of a lookup were chosen.
 enum class LookupSelectionType : std::int64_t { Default, Explicit, HintTap };
+template <>
+inline constexpr auto kTexts<LookupSelectionType> = texts("lookup_default", "lookup_explicit", "lookup_hint_tap");
 
 /// The index behind a local search.
 enum class IndexType : std::int64_t {
@@ -124,6 +161,9 @@ enum class IndexType : std::int64_t {
     WendralHistory,
     LookupDictionary,
 };
+template <>
+inline constexpr auto kTexts<IndexType> = texts("unknown", "vistrel", "calculator", "core_mirva", "wendral_bookmarks",
+                                                "wendral_history", "lookup_dictionary");
 
 /// Where a result comes from.
 enum class ResultType : std::int64_t {
@@ -143,9 +183,14 @@ enum class ResultType : std::int64_t {
     Yandex,
     Baidu,
 };
+template <>
+inline constexpr auto kTexts<ResultType> =
+    texts("unknown", "tavrin", "local", "core_vistrel", "ns_user_activity", "wendral_tophit", "calculator",
+          "conversion", "dictionary_definition", "google", "yahoo", "bing", "duckduckgo", "yandex", "baidu");
 
 /// Whether a result stands above all others.
 enum class TopHit : std::int64_t { No, ShouldBe, MustBe };
+template <> inline constexpr auto kTexts<TopHit> = texts("tophit_no", "tophit_should_be", "tophit_must_be");
 
 /// What brought results into view.
 enum class VisibleResultsTrigger : std::int64_t {
@@ -165,6 +210,10 @@ enum class VisibleResultsTrigger : std::int64_t {
     ArrowUp,
     ArrowDown,
 };
+template <>
+inline constexpr auto kTexts<VisibleResultsTrigger> =
+    texts("unknown", "result_list_updated", "scroll", "show_more", "peek", "pop", "show_less", "card_swipe", "click",
+          "view_resized", "scroll_up", "scroll_down", "resume_search", "arrow_up", "arrow_down");
 
 /// How a result was engaged.
 enum class ResultEngagementTrigger : std::int64_t {
@@ -183,6 +232,10 @@ enum class ResultEngagementTrigger : std::int64_t {
     ForcedAfterListUpdate,
     Shortcut,
 };
+template <>
+inline constexpr auto kTexts<ResultEngagementTrigger> =
+    texts("unknown", "enter", "tap", "click", "double_click", "peek", "pop", "reveal", "arrow_up", "arrow_down",
+          "three_fingers_tap", "swipe", "forced_after_list_update", "shortcut");
 
 /// Where the engagement of a result led.
 enum class ResultEngagementDestination : std::int64_t {
@@ -197,9 +250,16 @@ enum class ResultEngagementDestination : std::int64_t {
     TunrelSheet,
     HostedHtmlPage,
 };
+template <>
+inline constexpr auto kTexts<ResultEngagementDestination> =
+    texts("unknown", "card", "punchout", "none", "insert", "find_on_page", "last_search", "maps_card", "tunrel_sheet",
+          "hosted_html_page");
 
 /// What the engaged action of a result does.
 enum class ResultActionTarget : std::int64_t { Unknown, Directions, Call, Message, Play, View, Open };
+template <>
+inline constexpr auto kTexts<ResultActionTarget> =
+    texts("unknown", "directions", "call", "message", "play", "view", "open");
 
 /// How a card was engaged.
 enum class CardEngagementTrigger : std::int64_t {
@@ -214,9 +274,14 @@ enum class CardEngagementTrigger : std::int64_t {
     ArrowUp,
     ArrowDown,
 };
+template <>
+inline constexpr auto kTexts<CardEngagementTrigger> =
+    texts("unknown", "enter", "tap", "click", "double_click", "peek", "pop", "reveal", "arrow_up", "arrow_down");
 
 /// The kind of an engaged card.
 enum class CardType : std::int64_t { Unknown, Normal, Maps, TunrelSheet, HostedHtmlPage };
+template <>
+inline constexpr auto kTexts<CardType> = texts("unknown", "normal", "maps", "tunrel_sheet", "hosted_html_page");
 
 /// The part of a card that was engaged.
 enum class CardActionTarget : std::int64_t {
@@ -245,6 +310,11 @@ enum class CardActionTarget : std::int64_t {
     Season,
     Episode,
 };
+template <>
+inline constexpr auto kTexts<CardActionTarget> =
+    texts("unknown", "body", "phone", "home_page", "address", "directions_to_here", "directions_from_here",
+          "business_photo", "business_review", "write_a_review", "more_info", "report_a_problem", "preview", "details",
+          "play", "buy", "rent", "artist", "reviews", "related", "more", "trailer", "season", "episode");
 
 /// The part of a maps card that was engaged.
 enum class MapsCardFeedback : std::int64_t {
@@ -271,6 +341,11 @@ enum class MapsCardFeedback : std::int64_t {
     MoreInfo,
     PostalAddress,
 };
+template <>
+inline constexpr auto kTexts<MapsCardFeedback> =
+    texts("unknown", "phone_number", "website", "add_contact", "share", "directions_to_here", "directions_from_here",
+          "dismissed", "report_a_problem", "edit_contact", "delete_contact", "skeldor_tour", "all_photos", "photo",
+          "add_photo", "all_reviews", "review", "write_review", "deal", "checkin", "more_info", "postal_address");
 
 /// How a store's product page ended.
 enum class ProductPageResult : std::int64_t {
@@ -281,12 +356,18 @@ enum class ProductPageResult : std::int64_t {
     UserPurchasedItem,
     UserHitCustomRightBarButton,
 };
+template <>
+inline constexpr auto kTexts<ProductPageResult> =
+    texts("canceled_product_page", "closed_product_page", "product_page_download_finished",
+          "user_hit_goto_store_button", "user_purchased_item", "user_hit_custom_right_bar_button");
 
 /// Where a suggestion comes from.
 enum class SuggestionType : std::int64_t { Unknown, Tavrin, Proactive, Recents };
+template <> inline constexpr auto kTexts<SuggestionType> = texts("unknown", "tavrin", "proactive", "recents");
 
 /// What emptied the input field.
 enum class ClearInputTrigger : std::int64_t { Unknown, CrossButton, Cut, Backspace };
+template <> inline constexpr auto kTexts<ClearInputTrigger> = texts("unknown", "cross_button", "cut", "backspace");
 
 /// Why a request was not sent to the service.
 enum class SkipSearchTrigger : std::int64_t {
@@ -298,12 +379,19 @@ enum class SkipSearchTrigger : std::int64_t {
     EmptyQueryInput,
     QueryInputWithUriSchemePrefix,
 };
+template <>
+inline constexpr auto kTexts<SkipSearchTrigger> =
+    texts("unknown", "less_than_minimum_query_length", "bag_disabled", "bag_fetch_failed", "cache_hit",
+          "empty_query_input", "query_input_with_uri_scheme_prefix");
 
 /// How a section was engaged.
 enum class SectionEngagementTrigger : std::int64_t { Unknown, SearchInApp, ShowMore, ShowLess };
+template <>
+inline constexpr auto kTexts<SectionEngagementTrigger> = texts("unknown", "search_in_app", "show_more", "show_less");
 
 /// What a section's header offers.
 enum class SectionHeaderType : std::int64_t { Unknown, SearchInApp, ShowMore, Normal };
+template <> inline constexpr auto kTexts<SectionHeaderType> = texts("unknown", "search_in_app", "show_more", "normal");
 
 /// What a custom record is about.
 enum class CustomFeedbackType : std::int64_t { Unknown, WendralAutofill, Crowdsourcing, VistrelResultFeatures };

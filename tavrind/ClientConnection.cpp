@@ -20,6 +20,7 @@
 #include "tavrind/ClientState.h"
 #include "tavrind/ClientStateManager.h"
 #include "tavrind/DownloadManager.h"
+#include "tavrind/FeedbackClasses.h"
 #include "tavrind/TavrinBagController.h"
 #include "tavrind/TavrinFeedback.h"
 #include "tavrind/TavrinFeedbackFlusher.h"
@@ -31,27 +32,14 @@ namespace tavrin {
 
 namespace {
 
-// A record is about the query of its first result.
-std::uint64_t queryIdOf(const std::shared_ptr<ZRSearchResult>& result)
-{
-    return result ? result->queryId : 0;
-}
-std::uint64_t queryIdOf(const RecordArray<ZRSearchResult>& results)
-{
-    return results && !results->empty() ? queryIdOf(results->front()) : 0;
-}
-std::uint64_t queryIdOf(const std::shared_ptr<ZRResultSection>& section)
-{
-    return section ? queryIdOf(section->results) : 0;
-}
-std::uint64_t queryIdOf(const RecordArray<ZRResultSection>& sections)
-{
-    return sections && !sections->empty() ? queryIdOf(sections->front()) : 0;
-}
-std::uint64_t queryIdOf(const RecordArray<ZRSectionRankingFeedback>& sections)
-{
-    return sections && !sections->empty() && sections->front() ? queryIdOf(sections->front()->section) : 0;
-}
+/// How the search view appears where a search is likely to follow.
+constexpr std::array kWarmingEvents{
+    SearchViewAppearTrigger::TodayView,          SearchViewAppearTrigger::KeyboardShortcut,
+    SearchViewAppearTrigger::MouseClickOnMenu,   SearchViewAppearTrigger::TapToInput,
+    SearchViewAppearTrigger::NewWindow,          SearchViewAppearTrigger::Click,
+    SearchViewAppearTrigger::PullDownHomeScreen, SearchViewAppearTrigger::NotificationCenter,
+    SearchViewAppearTrigger::PartialPullDown,
+};
 
 /// A request of any other class gets no reply.
 bool isServed(const TAVRequest& request)
@@ -75,20 +63,6 @@ RequestReply traced(RequestReply reply, TAVTraceCode answer)
 }
 
 } // namespace
-
-std::uint64_t clientQueryIdOf(const ZRFeedback& feedback)
-{
-    if (const auto* f = dynamic_cast<const ZRStartSearchFeedback*>(&feedback)) return f->queryId;
-    if (const auto* f = dynamic_cast<const ZRRankingFeedback*>(&feedback)) return queryIdOf(f->sections);
-    if (const auto* f = dynamic_cast<const ZRLateSectionsAppendedFeedback*>(&feedback)) return queryIdOf(f->sections);
-    if (const auto* f = dynamic_cast<const ZRResultEngagementFeedback*>(&feedback)) return queryIdOf(f->result);
-    if (const auto* f = dynamic_cast<const ZRVisibleResultsFeedback*>(&feedback)) return queryIdOf(f->results);
-    if (const auto* f = dynamic_cast<const ZRResultsReceivedAfterTimeoutFeedback*>(&feedback))
-        return queryIdOf(f->results);
-    if (const auto* f = dynamic_cast<const ZRSectionEngagementFeedback*>(&feedback)) return queryIdOf(f->section);
-    if (const auto* f = dynamic_cast<const ZRVisibleSectionHeaderFeedback*>(&feedback)) return queryIdOf(f->section);
-    return 0;
-}
 
 ClientConnection::ClientConnection(Assembly& assembly, std::shared_ptr<TAVClientXPC> remoteObject,
                                    std::shared_ptr<platform::ipc::Connection> connection)
@@ -289,9 +263,8 @@ void ClientConnection::reportEvent(std::shared_ptr<ZRFeedback> feedback, std::in
                                     [] { TavrinLogForCategory(kLogFlusher).log("flushed custom feedback"); });
     }
     if (const auto* appear = dynamic_cast<const ZRSearchViewAppearFeedback*>(feedback.get())) {
-        static constexpr std::array<std::int64_t, 9> kWarming{2, 5, 6, 9, 10, 11, 22, 23, 24};
         if (!appear->isOnLockScreen &&
-            std::ranges::find(kWarming, static_cast<std::int64_t>(appear->viewAppearEvent)) != kWarming.end())
+            std::ranges::find(kWarmingEvents, appear->viewAppearEvent) != kWarmingEvents.end())
             _state->warm();
     }
     const auto manager = _state->sessionManager();
@@ -299,7 +272,7 @@ void ClientConnection::reportEvent(std::shared_ptr<ZRFeedback> feedback, std::in
         _reportOneOff(makeTAVError(TAVErrorInvalidResponse, "session manager nil"));
         return log.error("session manager nil");
     }
-    const std::uint64_t clientQueryId = clientQueryIdOf(*feedback);
+    const std::uint64_t clientQueryId = feedbackClassOf(*feedback).clientQueryId(*feedback);
 
     const auto& shortName = _state->clientShortName();
     const auto* engagement = dynamic_cast<const ZRResultEngagementFeedback*>(feedback.get());
@@ -317,13 +290,13 @@ void ClientConnection::reportEvent(std::shared_ptr<ZRFeedback> feedback, std::in
 void ClientConnection::handleCustomFeedback(std::shared_ptr<ZRCustomFeedback> feedback, std::int64_t queryId,
                                             std::move_only_function<void()> callback)
 {
-    switch (static_cast<std::int64_t>(feedback->feedbackType)) {
-    case 1:
-    case 3:
+    switch (feedback->feedbackType) {
+    case CustomFeedbackType::WendralAutofill:
+    case CustomFeedbackType::VistrelResultFeatures:
         ClientSession(_assembly, std::make_shared<TavrinFeedback>(std::move(feedback), queryId, "", userAgent()))
             .sessionComplete();
         return callback();
-    case 2:
+    case CustomFeedbackType::Crowdsourcing:
         _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.dp.submit");
         return _assembly.crowdsourcingFeedbackFlusher->flush(std::move(feedback), std::move(callback));
     default:

@@ -19,9 +19,6 @@ class ClientState;
 class ClientStateManager;
 class TavrinFlusherXPC;
 
-/// The query id that an event refers to: its own, or that of the first result that it is about; 0 for none.
-[[nodiscard]] std::uint64_t clientQueryIdOf(const ZRFeedback& feedback);
-
 /// What one client connection talks to.
 ///
 /// It is bound to the state of its client by the first valid configuration, and to no other after that. Calls arrive on

@@ -1,52 +1,42 @@
 #pragma once
 
+#include <array>
 #include <cstdint>
 #include <span>
 #include <type_traits>
+#include <utility>
 
 #include "platform/values/Value.h"
 #include "searchrecords/ZREnums.h"
 
-/// The strings that stand for the values of the records' enumerations in uploads. They are format. Any thread.
+/// The texts of the records' enumerations as values of an upload. Any thread.
 namespace tavrin {
 
-/// The strings of an enumeration, by value. Made on first use; copies of them share the text.
-template <class E> [[nodiscard]] std::span<const platform::Value> enumStrings();
+/// The texts of an enumeration, by value. Created on first use; copies share the text.
+template <class E> [[nodiscard]] std::span<const platform::Value> enumStrings()
+{
+    static const auto strings = []<std::size_t... I>(std::index_sequence<I...>) {
+        return std::array{platform::Value(kTexts<E>[I])...};
+    }(std::make_index_sequence<kTexts<E>.size()>());
+    return strings;
+}
 
-template <> std::span<const platform::Value> enumStrings<SearchViewAppearTrigger>();
-template <> std::span<const platform::Value> enumStrings<SearchViewDisappearTrigger>();
-template <> std::span<const platform::Value> enumStrings<CardViewDisappearTrigger>();
-template <> std::span<const platform::Value> enumStrings<StartSearchTrigger>();
-template <> std::span<const platform::Value> enumStrings<EndpointType>();
-template <> std::span<const platform::Value> enumStrings<LookupSelectionType>();
-template <> std::span<const platform::Value> enumStrings<IndexType>();
-template <> std::span<const platform::Value> enumStrings<ResultType>();
-template <> std::span<const platform::Value> enumStrings<TopHit>();
-template <> std::span<const platform::Value> enumStrings<VisibleResultsTrigger>();
-template <> std::span<const platform::Value> enumStrings<ResultEngagementTrigger>();
-template <> std::span<const platform::Value> enumStrings<ResultEngagementDestination>();
-template <> std::span<const platform::Value> enumStrings<ResultActionTarget>();
-template <> std::span<const platform::Value> enumStrings<CardEngagementTrigger>();
-template <> std::span<const platform::Value> enumStrings<CardType>();
-template <> std::span<const platform::Value> enumStrings<CardActionTarget>();
-template <> std::span<const platform::Value> enumStrings<MapsCardFeedback>();
-template <> std::span<const platform::Value> enumStrings<ProductPageResult>();
-template <> std::span<const platform::Value> enumStrings<SuggestionType>();
-template <> std::span<const platform::Value> enumStrings<ClearInputTrigger>();
-template <> std::span<const platform::Value> enumStrings<SkipSearchTrigger>();
-template <> std::span<const platform::Value> enumStrings<SectionEngagementTrigger>();
-template <> std::span<const platform::Value> enumStrings<SectionHeaderType>();
+/// The text of a value; null for a number that no enumerator has, which a client or a damaged file may hold.
+template <class E> [[nodiscard]] const platform::Value& enumToString(E value)
+{
+    static const platform::Value kNone;
+    const auto strings = enumStrings<E>();
+    const auto index = static_cast<std::uint64_t>(value);
+    return index < strings.size() ? strings[index] : kNone;
+}
 
-/// The string of a value of any of the enumerations. A number that is none of its enumeration's, as a client may send,
-/// reads as the first.
+/// `enumToString` under the name that a field's conversion has, for the enumerations of that field.
 template <class... Enumerations> struct EnumToString {
     template <class E>
         requires(std::is_same_v<E, Enumerations> || ...)
     const platform::Value& operator()(E value) const
     {
-        const auto strings = enumStrings<E>();
-        const auto index = static_cast<std::uint64_t>(value);
-        return strings[index < strings.size() ? index : 0];
+        return enumToString(value);
     }
 };
 

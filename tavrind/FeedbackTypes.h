@@ -5,11 +5,12 @@
 #include <string_view>
 #include <unordered_set>
 
+#include "searchrecords/ZREnums.h"
+
 namespace tavrin {
 
-struct ZRFeedback;
-
-/// The kinds of events in an upload. Values are positions in `eventTypes()`, and format like these names.
+/// The types of events in an upload. Values and texts are format. No record reports a visible card: its place keeps
+/// later values what they are.
 enum class EventType : std::int64_t {
     VisibleResults,
     NetworkSearchStart,
@@ -46,20 +47,29 @@ enum class EventType : std::int64_t {
     ConnectionInvalidated,
 };
 
-/// The names of the event types, by value.
-[[nodiscard]] std::span<const std::string_view> eventTypes();
+template <>
+inline constexpr auto kTexts<EventType> =
+    texts("visible_results", "network_search_start", "network_search_end", "local_search_start", "local_search_end",
+          "search_view_appear", "search_view_disappear", "rank_sections", "result_engagement", "visible_card",
+          "card_engagement", "error", "suggestion_engagement", "card_view_disappear", "search_start", "search_end",
+          "visible_suggestions", "custom_unknown", "custom_crowdsourcing", "custom_wendral_autofill",
+          "custom_vistrel_result_features", "unknown", "results_received_after_timeout", "late_sections_appended",
+          "clear_input", "session_end", "skip_tavrin_search", "section_engagement", "visible_section_header",
+          "session_missing_results", "session_missing_suggestions", "did_go_to_site", "connection_invalidated");
+
+/// The texts of the event types, by value.
+[[nodiscard]] constexpr std::span<const std::string_view> eventTypes()
+{
+    return kTexts<EventType>;
+}
+/// `type` must be an enumerator.
 [[nodiscard]] std::string_view eventTypeToString(EventType type);
 
-/// The keys that the daemon makes events of, and the objects in them. A client's own JSON, headers, features and timing
-/// data have others.
+/// The keys that the daemon writes into events and the objects in them. A client's own JSON, headers, features and
+/// timing data have others.
 [[nodiscard]] const std::unordered_set<std::string_view>& sharedKeySet();
 
-/// The event that a record reports: that of its class, which is listed for every class. A custom record's follows from
-/// its feedback type.
-[[nodiscard]] EventType eventType(const ZRFeedback& record);
-
-/// Whether events of a type, or of that record's, are uploaded with their query ids.
+/// Whether events of a type are uploaded with their query ids.
 [[nodiscard]] bool requiresQueryId(EventType type);
-[[nodiscard]] bool requiresQueryId(const ZRFeedback& record);
 
 } // namespace tavrin

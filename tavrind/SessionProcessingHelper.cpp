@@ -14,6 +14,19 @@ template <class Map> std::vector<typename Map::mapped_type> valuesOf(const Map& 
 
 } // namespace
 
+void SessionProcessingHelper::show(ZRResultRankingFeedback& ranking)
+{
+    show(ranking.hiddenResults);
+    show(ranking.duplicateResults);
+    show(ranking.result);
+}
+
+void SessionProcessingHelper::show(ZRSectionRankingFeedback& ranking)
+{
+    show(ranking.section);
+    show(ranking.results);
+}
+
 const std::string& SessionProcessingHelper::replacementForIdentifier(const std::string& identifier)
 {
     const auto [entry, isNew] = _privateIdMapping.try_emplace(identifier);

@@ -87,14 +87,15 @@ FeedbacksToSend StoredSession::getFeedbacksToSend()
     FeedbacksToSend upload{.nextEvent = [events = std::move(events)] { return events->next(); }};
 
     Dictionary rest{{"agent", _header.agent}, {"user_guid", _header.userGuid.isNil() ? "" : _header.userGuid.string()}};
-    // The list ends at what is missing.
+    // The list ends at the first missing value.
     if (_header.resourceVersions.asDictionary()) {
         rest.set("resource_versions", _header.resourceVersions);
         rest.set("first_use", _header.firstUse);
         const bool hidden = _header.removeTimestamps || !_header.baseTime;
         rest.set("base_time", hidden ? 0 : static_cast<std::int64_t>(platform::secondsSince1970(*_header.baseTime)));
-        rest.set("previous_session_end_reason", TavrinSessionEndFeedback::triggerEventEnumToString(
-                                                    static_cast<SessionEndReason>(_header.previousSessionEndReason)));
+        const Value& reason = TavrinSessionEndFeedback::triggerEventEnumToString(
+            static_cast<SessionEndReason>(_header.previousSessionEndReason));
+        if (!reason.isNull()) rest.set("previous_session_end_reason", reason);
     }
     upload.rest = std::move(rest);
     return upload;

@@ -3,35 +3,50 @@
 #include "CoreTavrin/TAVRecordClasses.h"
 #include "platform/values/Dictionary.h"
 #include "platform/values/Json.h"
+#include "tavrind/FeedbackClasses.h"
 #include "tavrind/FeedbackJson.h"
-#include "tavrind/FeedbackProcessing.h"
-#include "tavrind/FeedbackTypes.h"
 #include "tavrind/TavrinSessionFeedback.h"
 
 namespace tavrin {
 
+TavrinFeedback::TavrinFeedback() : TavrinFeedback(nullptr, 0, {}, {}) {}
+
 TavrinFeedback::TavrinFeedback(std::shared_ptr<ZRFeedback> feedback_, std::int64_t queryId_, std::string userGuid_,
                                std::string userAgent_, std::uint64_t clientQueryId_)
-    : feedback(std::move(feedback_)), queryId(queryId_), userGuid(std::move(userGuid_)),
-      userAgent(std::move(userAgent_)), clientQueryId(clientQueryId_)
-{}
+    : queryId(queryId_), userGuid(std::move(userGuid_)), userAgent(std::move(userAgent_)), clientQueryId(clientQueryId_)
+{
+    _setFeedback(std::move(feedback_));
+}
+
+const ZRFeedback& TavrinFeedback::_record() const
+{
+    static const ZRFeedback kNothing;
+    return _feedback ? *_feedback : kNothing;
+}
+
+void TavrinFeedback::_setFeedback(std::shared_ptr<ZRFeedback> feedback)
+{
+    _feedback = std::move(feedback);
+    _class = &feedbackClassOf(_record());
+}
 
 EventType TavrinFeedback::type() const
 {
-    return feedback ? eventType(*feedback) : EventType::Unknown;
+    return _class->eventType(_record());
 }
 
 platform::Dictionary TavrinFeedback::_commonDictionary() const
 {
-    static const ZRFeedback kNothing;
-    const ZRFeedback& record = feedback ? *feedback : kNothing;
-    const EventType type = eventType(record);
-    platform::Dictionary event = feedbackDictionary(record, type);
-    if (requiresQueryId(type)) {
-        event.set("query_id", queryId);
-        if (clientQueryId != 0) event.set("client_query_id", clientQueryId);
+    platform::Dictionary event;
+    event.reserve(8); // most records add up to four fields, and an event four more
+    JsonFields fields(event);
+    _class->addFields(fields, _record());
+    const EventType eventType = type();
+    if (requiresQueryId(eventType)) {
+        fields("query_id", queryId);
+        if (clientQueryId != 0) fields("client_query_id", clientQueryId);
     }
-    event.set("type", eventTypeToString(type));
+    fields("type", eventTypeToString(eventType));
     return event;
 }
 
@@ -51,13 +66,13 @@ std::string TavrinFeedback::description() const
 
 void TavrinFeedback::process(SessionProcessingHelper& helper)
 {
-    if (feedback) tavrin::process(*feedback, helper);
+    if (_feedback) _class->process(*_feedback, helper);
 }
 
 bool TavrinFeedback::decodeField(std::string_view key, platform::Decoder& decoder, std::size_t& next)
 {
     if (key != "feedback") return RecordOf::decodeField(key, decoder, next);
-    feedback = platform::decodeRecordIfA<ZRFeedback>(decoder);
+    _setFeedback(platform::decodeRecordIfA<ZRFeedback>(decoder));
     return true;
 }
 

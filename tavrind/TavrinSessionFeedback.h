@@ -8,6 +8,7 @@
 
 #include "searchrecords/ZRFeedback.h"
 #include "searchrecords/ZRSearchResult.h"
+#include "tavrind/FeedbackEnumerations.h"
 
 /// The daemon's own events: what happened to a session, and what it lacks.
 namespace tavrin {
@@ -22,6 +23,10 @@ enum class SessionEndReason : std::int64_t {
     CriticalMemory,
     EngagementReceived,
 };
+template <>
+inline constexpr auto kTexts<SessionEndReason> =
+    texts("no previous session", "external request", "session idle", "max session time passed", "guid changed",
+          "critical memory", "engagement received");
 
 /// A session ended.
 struct TavrinSessionEndFeedback : platform::RecordOf<TavrinSessionEndFeedback, ZRFeedback> {
@@ -31,10 +36,13 @@ struct TavrinSessionEndFeedback : platform::RecordOf<TavrinSessionEndFeedback, Z
     TavrinSessionEndFeedback() = default;
     explicit TavrinSessionEndFeedback(SessionEndReason reason_) : reason(reason_) {}
 
-    /// The names of the reasons, by value.
-    [[nodiscard]] static std::span<const std::string_view> eventTypes();
-    /// A reason's name; that of the first for a number that is none, as a damaged session file may hold.
-    [[nodiscard]] static std::string_view triggerEventEnumToString(SessionEndReason reason);
+    /// The texts of the reasons, by value.
+    [[nodiscard]] static constexpr std::span<const std::string_view> eventTypes() { return kTexts<SessionEndReason>; }
+    /// The text of a reason; null for a number that is no reason, which a damaged session file may hold.
+    [[nodiscard]] static const platform::Value& triggerEventEnumToString(SessionEndReason reason)
+    {
+        return enumToString(reason);
+    }
 
     static constexpr auto fields() { return std::tuple{platform::field("reason", &TavrinSessionEndFeedback::reason)}; }
 };

@@ -1,3 +1,5 @@
+#include <set>
+
 #include "platform/values/Dictionary.h"
 #include "searchrecords/ZRRecords.h"
 #include "searchrecords/ZRResultFeedback.h"
@@ -270,12 +272,12 @@ TEST_F(ConnectionTest, EventsReachTheSessionWithTheirQuery)
     EXPECT_EQ(record.queryId, 3);
     EXPECT_EQ(record.clientQueryId, 12u);
     EXPECT_EQ(record.userAgent, "Vistrel/4");
-    EXPECT_EQ(record.feedback->timestamp, device.clock.hostTicks()) << "stamped on arrival";
+    EXPECT_EQ(record.feedback()->timestamp, device.clock.hostTicks()) << "stamped on arrival";
     EXPECT_EQ(counter("vistrel.tophit.engagements"), 1);
     EXPECT_EQ(counter("vistrel.tavrin.engagements"), 1);
 
     report(*connection, "ZRClearInputFeedback", {{"timestamp", 5}});
-    EXPECT_EQ(session->records[1]->feedback->timestamp, 5u);
+    EXPECT_EQ(session->records[1]->feedback()->timestamp, 5u);
     for (const int type : {0, 1, 2, 3, 9}) report(*connection, "ZRCustomFeedback", {{"feedbackType", type}});
     EXPECT_EQ(session->records.size(), 2u) << "custom records take their own road";
     EXPECT_EQ(counter("dp.submit"), 1);
@@ -293,35 +295,17 @@ TEST_F(ConnectionTest, WarmsTheConnectionWhenASearchViewAppears)
         report(*connection, "ZRSearchViewAppearFeedback", {{"viewAppearEvent", event}, {"isOnLockScreen", lockScreen}});
         return tasks().size() > before;
     };
-    EXPECT_FALSE(warmed(2, true));
-    EXPECT_FALSE(warmed(1, false));
-    EXPECT_TRUE(warmed(2, false));
-    EXPECT_EQ(lastTask()->originalRequest().url.string(), "https://s.example/warm");
-    device.advance(29s);
-    EXPECT_FALSE(warmed(24, false)) << "still warm";
-    device.advance(1s);
-    EXPECT_TRUE(warmed(24, false));
-}
-
-TEST(ClientQueryId, IsThatOfTheFirstResultConcerned)
-{
-    const auto result = std::make_shared<ZRSearchResult>();
-    result->queryId = 7;
-    const auto section = std::make_shared<ZRResultSection>();
-    section->results = std::vector{result};
-    ZRVisibleResultsFeedback visible;
-    EXPECT_EQ(clientQueryIdOf(visible), 0u);
-    visible.results.emplace(1, nullptr);
-    EXPECT_EQ(clientQueryIdOf(visible), 0u);
-    visible.results = std::vector{result};
-    EXPECT_EQ(clientQueryIdOf(visible), 7u);
-    ZRLateSectionsAppendedFeedback late;
-    late.sections = std::vector{section};
-    EXPECT_EQ(clientQueryIdOf(late), 7u);
-    ZRSectionEngagementFeedback engagement;
-    EXPECT_EQ(clientQueryIdOf(engagement), 0u);
-    engagement.section = section;
-    EXPECT_EQ(clientQueryIdOf(engagement), 7u);
+    const std::set<int> warming{2, 5, 6, 9, 10, 11, 22, 23, 24};
+    for (int event = -1; event <= 27; ++event) {
+        EXPECT_FALSE(warmed(event, true)) << event;
+        EXPECT_EQ(warmed(event, false), warming.contains(event)) << event;
+        if (warming.contains(event)) {
+            EXPECT_EQ(lastTask()->originalRequest().url.string(), "https://s.example/warm");
+            device.advance(29s);
+            EXPECT_FALSE(warmed(event, false)) << "still warm";
+        }
+        device.advance(31s);
+    }
 }
 
 TEST(Logging, ACategoryOutOfRangeIsAProgrammingError)

@@ -543,7 +543,7 @@ TEST_F(ImageFaults, EachLeavesItsOwnImageOut)
 
     Strings errors;
     for (const auto& record : session->records)
-        if (const auto error = std::dynamic_pointer_cast<ZRErrorFeedback>(record->feedback))
+        if (const auto error = std::dynamic_pointer_cast<ZRErrorFeedback>(record->feedback()))
             errors.push_back(error->error->reason());
     EXPECT_EQ(errors.size(), 8u) << "short, reset, empty, nobody, nohttp, ftp, loop, huge";
 }

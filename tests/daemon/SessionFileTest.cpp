@@ -71,7 +71,7 @@ struct SessionFileTest : FeedbackTest {
     {
         std::vector<std::string> inputs;
         for (const auto& each : session.feedbacks())
-            inputs.push_back(*std::dynamic_pointer_cast<ZRDidGoToSiteFeedback>(each->feedback)->input);
+            inputs.push_back(*std::dynamic_pointer_cast<ZRDidGoToSiteFeedback>(each->feedback())->input);
         return inputs;
     }
 

@@ -71,7 +71,7 @@ template <class E, class ToString> void expectStrings(const std::string& name, c
         EXPECT_TRUE(plain(documented[i]).ends_with(plain(names[i]))) << names[i] << " stands for " << documented[i];
     }
     for (const std::int64_t beyond : {static_cast<std::int64_t>(names.size()), std::int64_t{-1}, INT64_MIN, INT64_MAX})
-        EXPECT_EQ(toString(static_cast<E>(beyond)), platform::Value(documented[0])) << beyond;
+        EXPECT_EQ(toString(static_cast<E>(beyond)), platform::Value()) << beyond;
 }
 
 TEST(Enumerations, HaveTheStringsThatTheServiceReads)
@@ -105,7 +105,7 @@ TEST(Enumerations, HaveTheStringsThatTheServiceReads)
 
 TEST(Enumerations, SessionEndReasonsHaveTheirTexts)
 {
-    const std::pair<SessionEndReason, std::string_view> cases[] = {
+    const std::pair<SessionEndReason, platform::Value> cases[] = {
         {SessionEndReason::NoPreviousSession, "no previous session"},
         {SessionEndReason::ExternalRequest, "external request"},
         {SessionEndReason::SessionIdle, "session idle"},
@@ -113,8 +113,8 @@ TEST(Enumerations, SessionEndReasonsHaveTheirTexts)
         {SessionEndReason::GuidChanged, "guid changed"},
         {SessionEndReason::CriticalMemory, "critical memory"},
         {SessionEndReason::EngagementReceived, "engagement received"},
-        {static_cast<SessionEndReason>(7), "no previous session"},
-        {static_cast<SessionEndReason>(-1), "no previous session"},
+        {static_cast<SessionEndReason>(7), nullptr},
+        {static_cast<SessionEndReason>(-1), nullptr},
     };
     for (const auto& [reason, text] : cases)
         EXPECT_EQ(TavrinSessionEndFeedback::triggerEventEnumToString(reason), text);

@@ -71,8 +71,8 @@ TEST(FeedbackJson, WhatIsMissingIsNullOrLeftOut)
         const char* given; ///< fields of the record
         const char* told;  ///< what its event begins with, up to the keys of every event
     } const cases[] = {
-        {"ZRStartSearchFeedback", R"("triggerEvent":99)", R"("trigger_event":"unknown","input":null,"uuid":null,)"},
-        {"ZRVisibleResultsFeedback", R"("triggerEvent":-1)", R"("trigger_event":"unknown","results":null,)"},
+        {"ZRStartSearchFeedback", R"("triggerEvent":99)", R"("trigger_event":null,"input":null,"uuid":null,)"},
+        {"ZRVisibleResultsFeedback", R"("triggerEvent":-1)", R"("trigger_event":null,"results":null,)"},
         {"ZRVisibleResultsFeedback", R"("results":[])", R"("trigger_event":"unknown","results":[],)"},
         {"ZRRankingFeedback", R"("sections":[{"class":"ZRSectionRankingFeedback"}])",
          R"("blending_duration":0,"sections":[{"local_section_position":0,"results":null}],)"},
@@ -113,8 +113,7 @@ TEST(FeedbackJson, WhatIsMissingIsNullOrLeftOut)
          R"("trigger_event":"unknown","card_type":"unknown","action_target":"unknown","action_destination":"a:",)"},
         {"ZRSuggestionEngagementFeedback", R"("timestamp":1)", R"("id":null,)"},
         {"ZRSectionEngagementFeedback", R"("timestamp":1)", R"("id":null,"trigger_event":"unknown",)"},
-        {"ZRVisibleSectionHeaderFeedback", R"("headerType":9)",
-         R"("section_id":null,"section_header_type":"unknown",)"},
+        {"ZRVisibleSectionHeaderFeedback", R"("headerType":9)", R"("section_id":null,"section_header_type":null,)"},
         {"ZRVisibleSuggestionsFeedback", R"("suggestions":[])", R"("suggestions":[],)"},
         {"ZRVisibleSuggestionsFeedback", R"("timestamp":1)", R"("suggestions":null,)"},
         {"ZRVisibleSuggestionsFeedback", R"("suggestions":[{"class":"TAVSearchSuggestion"}])",
@@ -156,7 +155,7 @@ TEST(FeedbackJson, IdsOfQueriesAreSignedAndTheClientsIsLeftOutIfItHasNone)
 TEST(FeedbackJson, DescriptionsTellTheRecordsOwnTime)
 {
     TavrinFeedback event(feedbackFrom(R"({"class":"ZRDidGoToSiteFeedback","input":"a\nb"})"), 2, "", "");
-    event.feedback->timestamp = 7'000'999'999;
+    event.feedback()->timestamp = 7'000'999'999;
     event.relTimestamp = 5;
     EXPECT_EQ(event.description(), R"({"input":"a\nb","query_id":2,"type":"did_go_to_site","timestamp":7000})");
 }

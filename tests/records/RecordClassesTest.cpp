@@ -228,7 +228,7 @@ TEST(RecordClasses, AnEventSurvivesARecordThatIsNoneOfAnEvent)
         for (const auto& decoded : decodedBothWays(value)) {
             ASSERT_TRUE(decoded) << decoded.error().description();
             const auto& event = dynamic_cast<const TavrinFeedback&>(**decoded);
-            EXPECT_EQ(event.feedback, nullptr) << platform::toJson(inner);
+            EXPECT_EQ(event.feedback(), nullptr) << platform::toJson(inner);
             EXPECT_EQ(event.queryId, 7);
         }
     }

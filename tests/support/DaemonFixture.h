@@ -33,13 +33,13 @@ public:
     std::vector<std::string> takeClasses()
     {
         std::vector<std::string> classes;
-        for (const auto& record : records) classes.emplace_back(record->feedback->className());
+        for (const auto& record : records) classes.emplace_back(record->feedback()->className());
         records.clear();
         return classes;
     }
     template <class T> std::shared_ptr<T> last() const
     {
-        return records.empty() ? nullptr : std::dynamic_pointer_cast<T>(records.back()->feedback);
+        return records.empty() ? nullptr : std::dynamic_pointer_cast<T>(records.back()->feedback());
     }
 
     std::vector<std::shared_ptr<TavrinFeedback>> records;

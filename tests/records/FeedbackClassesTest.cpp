@@ -1,10 +1,12 @@
+#include "tavrind/FeedbackClasses.h"
+
 #include <set>
 
 #include <gtest/gtest.h>
 
-#include "searchrecords/ZRViewFeedback.h"
-#include "tavrind/FeedbackTypes.h"
-#include "tavrind/TavrinFeedback.h"
+#include "searchrecords/ZRRecords.h"
+#include "tests/records/FeedbackExamples.h"
+#include "tests/records/RecordFilling.h"
 
 namespace tavrin {
 namespace {
@@ -55,7 +57,7 @@ const std::vector<Event> kEvents{
     {32, "connection_invalidated", {"TavrinConnectionInvalidated"}, false},
 };
 
-TEST(EventTypes, EveryRecordReportsItsEvent)
+TEST(FeedbackClasses, EveryRecordReportsItsEvent)
 {
     std::set<std::string_view> checked;
     EXPECT_EQ(eventTypes().size(), kEvents.size());
@@ -67,9 +69,8 @@ TEST(EventTypes, EveryRecordReportsItsEvent)
         for (const std::string_view name : event.classes) {
             const auto record = std::dynamic_pointer_cast<ZRFeedback>(tavrindRecordClasses().make(name));
             ASSERT_TRUE(record) << name;
-            EXPECT_EQ(eventType(*record), type) << name;
-            EXPECT_EQ(requiresQueryId(*record), event.withQueryIds) << name;
-            EXPECT_EQ(TavrinFeedback(record, 1, "", "").type(), type);
+            EXPECT_EQ(feedbackClassOf(*record).name, name);
+            EXPECT_EQ(TavrinFeedback(record, 1, "", "").type(), type) << name;
             checked.insert(name);
         }
     }
@@ -81,18 +82,55 @@ TEST(EventTypes, EveryRecordReportsItsEvent)
     EXPECT_EQ(TavrinFeedback().type(), EventType::Unknown);
 }
 
-TEST(EventTypes, CustomRecordsReportWhatTheirTypeSays)
+TEST(FeedbackClasses, CustomRecordsReportWhatTheirTypeSays)
 {
     const std::pair<std::int64_t, int> cases[] = {{0, 17}, {1, 19}, {2, 18}, {3, 20}, {4, 17}, {-1, 17}};
     for (const auto& [type, index] : cases) {
         ZRCustomFeedback record;
         record.feedbackType = static_cast<CustomFeedbackType>(type);
-        EXPECT_EQ(static_cast<int>(eventType(record)), index) << type;
-        EXPECT_EQ(requiresQueryId(record), index != 20) << type;
+        EXPECT_EQ(static_cast<int>(feedbackClassOf(record).eventType(record)), index) << type;
     }
 }
 
-TEST(EventTypes, EventsSortByTheirRecordsTimestamps)
+TEST(FeedbackClasses, EveryRecordNamesTheQueryOfItsFirstResult)
+{
+    constexpr const char* kResults = R"("results":[{"class":"ZRSearchResult","queryId":7},{"class":"ZRSearchResult"}])";
+    const std::string section = std::string(R"({"class":"ZRResultSection",)") + kResults + "}";
+    const std::string ranking = R"({"class":"ZRSectionRankingFeedback","section":)" + section + "}";
+    const std::pair<std::string_view, std::string> cases[] = {
+        {"ZRStartSearchFeedback", R"("queryId":7)"},
+        {"ZRStartLocalSearchFeedback", R"("queryId":7)"},
+        {"ZRStartNetworkSearchFeedback", R"("queryId":7)"},
+        {"TAVLookupStartNetworkSearchFeedback", R"("queryId":7)"},
+        {"ZRRankingFeedback", R"("sections":[)" + ranking + "]"},
+        {"TAVRankerFeedback", R"("sections":[)" + ranking + "]"},
+        {"ZRLateSectionsAppendedFeedback", R"("sections":[)" + section + "]"},
+        {"ZRResultEngagementFeedback", R"("result":{"class":"ZRSearchResult","queryId":7})"},
+        {"ZRVisibleResultsFeedback", kResults},
+        {"ZRResultsReceivedAfterTimeoutFeedback", kResults},
+        {"ZRSectionEngagementFeedback", R"("section":)" + section},
+        {"ZRVisibleSectionHeaderFeedback", R"("section":)" + section},
+    };
+    const auto clientQueryId = [](const ZRFeedback& record) { return feedbackClassOf(record).clientQueryId(record); };
+    std::set<std::string_view> checked;
+    for (const auto& [name, fields] : cases) {
+        const std::string empty = R"({"class":")" + std::string(name) + '"';
+        EXPECT_EQ(clientQueryId(*feedbackFrom(empty + "," + fields + "}")), 7u) << name;
+        EXPECT_EQ(clientQueryId(*feedbackFrom(empty + "}")), 0u) << name;
+        checked.insert(name);
+    }
+    ZRVisibleResultsFeedback missing;
+    missing.results.emplace(1, nullptr);
+    EXPECT_EQ(clientQueryId(missing), 0u);
+    for (const auto& [name, make] : tavrindRecordClasses()) {
+        const auto record = std::dynamic_pointer_cast<ZRFeedback>(make());
+        if (!record || checked.contains(name)) continue;
+        fill(*record, tavrindRecordClasses());
+        EXPECT_EQ(clientQueryId(*record), 0u) << name;
+    }
+}
+
+TEST(TavrinFeedback, EventsSortByTheirRecordsTimestamps)
 {
     const auto at = [](std::uint64_t timestamp) {
         auto record = std::make_shared<ZRFeedback>();

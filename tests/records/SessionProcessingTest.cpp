@@ -1,5 +1,3 @@
-#include "tavrind/FeedbackProcessing.h"
-
 #include <regex>
 
 #include <gtest/gtest.h>
@@ -7,7 +5,6 @@
 #include "platform/values/Dictionary.h"
 #include "platform/values/Json.h"
 #include "platform/values/ValueCoder.h"
-#include "searchrecords/ZRResultFeedback.h"
 #include "tavrind/SessionProcessingHelper.h"
 #include "tavrind/TavrinSessionFeedback.h"
 #include "tests/records/FeedbackExamples.h"
@@ -115,11 +112,10 @@ TEST(SessionProcessing, MissingResultsAreThoseFirstReferredToInOrder)
 {
     SessionProcessingHelper helper;
     for (int i = 0; i < 24; ++i) {
-        ZRResultEngagementFeedback record;
-        record.result = std::make_shared<ZRSearchResult>();
-        record.result->identifier = "private " + std::to_string(i % 12);
-        record.result->rankingScore = i;
-        process(record, helper);
+        const auto result = std::make_shared<ZRSearchResult>();
+        result->identifier = "private " + std::to_string(i % 12);
+        result->rankingScore = i;
+        helper.refer(result);
     }
     const auto missing = helper.missingResults();
     ASSERT_EQ(missing.size(), 12u);
