@@ -26,7 +26,6 @@
 #include "platform/values/Record.h"
 #include "tavrind/ClientSessionHeader.h"
 #include "tavrind/CompressedOutputStream.h"
-#include "tavrind/FeedbackBooks.h"
 #include "tavrind/FileContainer.h"
 #include "tavrind/StoredSession.h"
 #include "tavrind/TavrinDiagnosticDataReporter.h"
@@ -45,7 +44,7 @@ class Storage {
 public:
     Storage()
         : _store(std::make_shared<const FileContainerStore>(
-              FileContainerStore{*files, _transactions, _diagnosticData, _books, _queue, "bench", kSessionSize}))
+              FileContainerStore{*files, _transactions, _diagnosticData, _queue, "bench", kSessionSize}))
     {}
 
     [[nodiscard]] std::filesystem::path path(const std::string& name) const { return _directory / name; }
@@ -83,7 +82,6 @@ private:
     platform::WorkerPool _pool;
     std::shared_ptr<platform::Queue> _queue =
         platform::Queue::make("bench.storage", platform::Queue::Kind::Serial, _pool, *_clock);
-    FeedbackBooks _books{*files, _directory / "books.json", _queue};
     std::shared_ptr<const FileContainerStore> _store;
 };
 
@@ -124,12 +122,11 @@ std::filesystem::path writeSession(const Storage& storage)
 std::string flushSession(const Storage& storage, const std::filesystem::path& file)
 {
     const auto body = storage.path("body");
-    const auto session = storage.container(file)->read();
+    const auto session = storage.container(file)->read().session;
     require(session != nullptr, "the session can't be read");
     CompressedOutputStream stream(std::make_unique<FileOutputStream>(storage.files->createForAppending(body).value()));
     stream.open();
-    FeedbacksToSend feedbacks = session->getFeedbacksToSend();
-    require(writeJson(feedbacks, stream), "the session can't be written");
+    require(session->getFeedbacksToSend(stream).has_value(), "the session can't be written");
     stream.close();
     require(storage.files->remove(body).has_value(), body);
     return stream.dataDigestForStream();
@@ -154,10 +151,10 @@ std::string deflateAndDigest(const std::string& text)
 
 std::string jsonOf(const Storage& storage, const std::filesystem::path& file)
 {
-    FeedbacksToSend feedbacks = storage.container(file)->read()->getFeedbacksToSend();
     MemoryOutputStream stream;
     stream.open();
-    require(writeJson(feedbacks, stream), "the session can't be written");
+    require(storage.container(file)->read().session->getFeedbacksToSend(stream).has_value(),
+            "the session can't be written");
     return stream.contents();
 }
 

@@ -55,7 +55,7 @@ struct Device : platform::test::TestDevice {
         std::vector<std::shared_ptr<StoredSession>> sessions;
         const auto& storage = daemon->assembly.persistentStorage;
         for (const auto& container : storage->getAvailableSessionHandles()) {
-            sessions.push_back(container->read());
+            sessions.push_back(container->read().session);
             check(sessions.back() != nullptr);
             storage->deleteSessionWithFileContainer(container);
         }

@@ -6,7 +6,6 @@
 #include "platform/files/Counters.h"
 #include "platform/run/Transactions.h"
 #include "platform/values/Archive.h"
-#include "platform/values/Json.h"
 #include "platform/values/Record.h"
 #include "tavrind/ClientSessionHeader.h"
 #include "tavrind/FileContainer.h"
@@ -38,18 +37,15 @@ void readFile(std::string contents)
     platform::CounterStore counters;
     TavrinDiagnosticDataReporter diagnosticData(counters);
     const auto queue = platform::Queue::make("storage", platform::Queue::Kind::Serial, executor, clock);
-    FeedbackBooks books(files, "/books.json", queue);
     const auto store = std::make_shared<const FileContainerStore>(
-        FileContainerStore{files, transactions, diagnosticData, books, queue, "tavrind/1", 4u << 20});
+        FileContainerStore{files, transactions, diagnosticData, queue, "tavrind/1", 4u << 20});
 
     files.files[kFile] = std::move(contents);
-    const std::uint64_t count = FileContainer::countFeedback(*store, kFile);
-    books.find(FeedbackFate::Closed, count);
-    const auto session = std::make_shared<FileContainer>(store, kFile, count)->read();
+    const auto container = std::make_shared<FileContainer>(store, kFile);
+    queue->sync([&container] { container->countFeedback(); });
+    const auto [session, lost, fate] = container->read();
     const std::size_t events = session ? session->recordedEvents() : 0;
-    check(books.count(FeedbackFate::Closed) == static_cast<std::int64_t>(events),
-          platform::toJson(books.description()));
-    fuzz::checkBooks(books);
+    check(container->feedbackCount() == events + lost, std::to_string(lost));
     if (!session) return;
     for (const auto& event : session->feedbacks()) (void)event->description();
     fuzz::checkUpload(*session);

@@ -7,7 +7,6 @@
 #include "tavrind/FeedbackBooks.h"
 #include "tavrind/OutputStream.h"
 #include "tavrind/StoredSession.h"
-#include "tavrind/TavrinFeedbackFlusher.h"
 
 namespace fuzz {
 
@@ -16,15 +15,14 @@ inline void checkUpload(tavrin::StoredSession& session)
 {
     constexpr std::size_t kKindsOfMissing = 2; // results and suggestions
     const std::size_t events = session.recordedEvents();
-    tavrin::FeedbacksToSend feedbacks = session.getFeedbacksToSend();
-    const std::size_t keys = feedbacks.count();
     tavrin::MemoryOutputStream stream;
     stream.open();
-    check(tavrin::writeJson(feedbacks, stream));
+    const auto keys = session.getFeedbacksToSend(stream);
+    check(keys.has_value());
 
     const auto json = platform::parseJson(stream.contents());
     if (!json) return check(json.error().reason().starts_with("nested deeper"), json.error().description());
-    check(json->count() == keys, stream.contents());
+    check(json->count() == *keys, stream.contents());
     const platform::Value::Array& sent = *(*json)["fb"].asArray();
     check(sent.size() >= events && sent.size() <= events + kKindsOfMissing, std::to_string(sent.size()));
     for (const platform::Value& event : sent)

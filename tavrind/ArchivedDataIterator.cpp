@@ -6,28 +6,32 @@
 
 namespace tavrin {
 
-std::uint64_t ArchivedDataIterator::_length() const
+std::expected<std::string_view, const char*> ArchivedDataIterator::_next()
 {
+    // With exactly a length left, hasMore() is true and this fails: the file was cut there.
+    if (_position + kLengthSize >= _data.size()) return std::unexpected("out of range");
     std::uint64_t length = 0;
     std::memcpy(&length, _data.data() + _position, sizeof(length));
-    return length;
+    if (length == 0) return std::unexpected("empty data file");
+    if (length > _data.size() - _position - kLengthSize) return std::unexpected("broken version string in file");
+    const auto archive = _data.view().substr(_position + kLengthSize, length);
+    _position += kLengthSize + length;
+    return archive;
 }
 
 std::optional<std::string_view> ArchivedDataIterator::readNextObject()
 {
-    const platform::Log& log = TavrinLogForCategory(kLogFeedbackStorage);
-    const auto failed = [&log](const char* text) {
-        log.error("{}", text);
-        return std::nullopt;
-    };
-    // Of an end with a bare length hasMore says yes and this says no: the end of a file that was cut right there.
-    if (_position + kLengthSize >= _data.size()) return failed("out of range");
-    const std::uint64_t length = _length();
-    if (length == 0) return failed("empty data file");
-    if (length > _data.size() - _position - kLengthSize) return failed("broken version string in file");
-    const auto archive = _data.view().substr(_position + kLengthSize, length);
-    _position += kLengthSize + length;
-    return archive;
+    const auto archive = _next();
+    if (archive) return *archive;
+    TavrinLogForCategory(kLogFeedbackStorage).error("{}", archive.error());
+    return std::nullopt;
+}
+
+std::uint64_t ArchivedDataIterator::countRecords()
+{
+    std::uint64_t count = 0;
+    while (_next()) ++count;
+    return count;
 }
 
 } // namespace tavrin

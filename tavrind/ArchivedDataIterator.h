@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstdint>
+#include <expected>
 #include <optional>
 #include <string_view>
 
@@ -8,26 +9,28 @@
 
 namespace tavrin {
 
-/// Walks the records of a session file in memory: each a length of 8 bytes in the host's order and so many bytes of
-/// archive (docs/formats.md). Failures are logged. One thread at a time.
+/// Walks the records of a session file in memory: each is a length of 8 bytes in the host's byte order, then the
+/// archive (docs/formats.md). One thread at a time.
 class ArchivedDataIterator {
 public:
     explicit ArchivedDataIterator(platform::Bytes data) : _data(std::move(data)) {}
 
-    /// Whether a length fits before the end. It may still turn out that no record follows.
+    /// Returns whether a length fits before the end. No record need follow it.
     [[nodiscard]] bool hasMore() const { return _position + kLengthSize <= _data.size(); }
-    /// The next record's archive; none at the end or at a broken record, and the position stays.
+    /// Returns the next record's archive. At the end or at a broken record, logs why, returns nothing and stays.
     [[nodiscard]] std::optional<std::string_view> readNextObject();
+    /// Moves to the first broken record or the end, without a log line, and returns the number of records passed.
+    std::uint64_t countRecords();
 
-    /// Where the next record's length begins.
+    /// The offset of the next record's length.
     [[nodiscard]] std::uint64_t position() const { return _position; }
     [[nodiscard]] std::uint64_t size() const { return _data.size(); }
 
     static constexpr std::uint64_t kLengthSize = sizeof(std::uint64_t);
 
 private:
-    /// The length at the position, which must be within the data.
-    [[nodiscard]] std::uint64_t _length() const;
+    /// Moves past the next record and returns its archive, or says why it can't.
+    std::expected<std::string_view, const char*> _next();
 
     platform::Bytes _data;
     std::uint64_t _position = 0;

@@ -72,7 +72,7 @@ std::shared_ptr<BackgroundActivitiesManager> BackgroundActivitiesManager::make(A
 BackgroundActivitiesManager::BackgroundActivitiesManager(Assembly& assembly)
     : _assembly(assembly), _queueFlusher(assembly.device.serialQueue(
                                "com.quorvane.tavrind.backgrondActivitiesManagerQueue", platform::Priority::Background)),
-      _feedbackFlusher(TavrinFeedbackFlusher::make(assembly, 1))
+      _feedbackFlusher(TavrinFeedbackFlusher::make(assembly, FlusherIdentity::Feedbacks))
 {}
 
 BackgroundActivitiesManager::~BackgroundActivitiesManager()
@@ -111,10 +111,11 @@ void BackgroundActivitiesManager::_flusherActivity()
     _queueFlusher->assertOnQueue();
     _sweepBodies();
     for (const auto& container : _assembly.persistentStorage->getAvailableSessionHandles()) {
-        const auto session = container->read();
+        const auto [session, lost, fate] = container->read();
         _assembly.persistentStorage->deleteSessionWithFileContainer(container);
+        _assembly.feedbackBooks.move(FeedbackFate::Closed, fate, lost);
         if (!session) continue;
-        // In memory again, until it is in an upload.
+        // The events are in memory again, until they are in an upload.
         _assembly.feedbackBooks.move(FeedbackFate::Closed, FeedbackFate::Open, session->recordedEvents());
         _feedbackFlusher->flushSyncFromArray({session});
         _flushToWire(*_feedbackFlusher);

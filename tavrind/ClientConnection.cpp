@@ -282,9 +282,9 @@ void ClientConnection::reportEvent(std::shared_ptr<ZRFeedback> feedback, std::in
         if (engagement->result->type == ResultType::Tavrin)
             _assembly.diagnosticData.addValue(1, createCounterKey(*shortName, "tavrin.engagements"));
     }
-    auto event = std::make_shared<TavrinFeedback>(std::move(feedback), queryId, "", userAgent(), clientQueryId);
-    event->call = std::move(call);
-    manager->addTavrinFeedback(std::move(event));
+    manager->addTavrinFeedback(
+        std::make_shared<TavrinFeedback>(std::move(feedback), queryId, "", userAgent(), clientQueryId),
+        std::move(call));
 }
 
 void ClientConnection::handleCustomFeedback(std::shared_ptr<ZRCustomFeedback> feedback, std::int64_t queryId,

@@ -31,7 +31,7 @@ namespace {
 
 using Feedbacks = std::vector<std::shared_ptr<TavrinFeedback>>;
 
-/// The first of `names` that the text, in small letters, contains.
+/// Returns the first of `names` that the lower-cased text contains.
 template <std::size_t N>
 std::optional<std::string_view> firstNamed(std::string_view text, const std::array<std::string_view, N>& names)
 {
@@ -58,7 +58,7 @@ std::optional<std::string_view> dailyActiveClient(std::string_view firstUseKey)
 }
 
 ClientSession::ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback> feedback,
-                             std::int64_t previousSessionEndReason)
+                             std::int64_t previousSessionEndReason, std::shared_ptr<void> call)
     : _assembly(assembly), _sessionQueue(assembly.device.serialQueue("com.quorvane.tavrind.clientSessionQueue")),
       _sessionFeedbacks(std::make_shared<Feedbacks>())
 {
@@ -74,7 +74,7 @@ ClientSession::ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback>
     if (assembly.downloadManager) _header.resourceVersions = assembly.downloadManager->resourceVersions();
     if (assembly.persistentStorage) _storageHandle = assembly.persistentStorage->createFileContainerForWriting();
     if (_storageHandle) _storageHandle->writeSessionHeader(_header);
-    if (feedback) addFeedback(std::move(feedback));
+    if (feedback) addFeedback(std::move(feedback), std::move(call));
 }
 
 ClientSession::~ClientSession() = default;
@@ -103,32 +103,31 @@ bool ClientSession::_updateFirstUseDate()
     return true;
 }
 
-void ClientSession::addFeedback(std::shared_ptr<TavrinFeedback> feedback)
+void ClientSession::addFeedback(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call)
 {
     if (!feedback) return TavrinLogForCategory(kLogSession).error("attempted to add a nil feedback");
     const bool otherUser = !_header.userGuid.isNil() && feedback->userGuid != _header.userGuid.string();
     const std::string agent = feedback->userAgent;
-    _write(std::move(feedback));
+    _write(std::move(feedback), std::move(call));
     if (!otherUser) return;
     auto error = std::make_shared<ZRErrorFeedback>(makeTAVError(TAVErrorInvalidResponse, "different guid in session"));
     error->timestamp = _assembly.device.clock.hostTicks();
-    _write(std::make_shared<TavrinFeedback>(std::move(error), 0, "", agent));
+    _write(std::make_shared<TavrinFeedback>(std::move(error), 0, "", agent), nullptr);
 }
 
-void ClientSession::_write(std::shared_ptr<TavrinFeedback> feedback)
+void ClientSession::_write(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call)
 {
     if (_assembly.flusherXPCListener) _assembly.flusherXPCListener->sendDataToReceivingStreamListener(*feedback);
-    _assembly.feedbackBooks.record(_storageHandle ? FeedbackFate::Open : FeedbackFate::NoContainer);
+    FeedbackBooks& books = _assembly.feedbackBooks;
+    books.record(_storageHandle ? FeedbackFate::Open : FeedbackFate::NoContainer);
     if (!_storageHandle) return;
-    std::move_only_function<void()> keep;
-    if (_assembly.testFeedbacks)
-        keep = [queue = _sessionQueue, kept = _sessionFeedbacks, feedback] {
-            queue->async([kept, feedback] {
-                feedback->call.reset();
-                kept->push_back(feedback);
-            });
-        };
-    _storageHandle->writeFeedback(std::move(feedback), std::move(keep));
+    auto done = [&books, call = std::move(call), queue = _sessionQueue,
+                 kept = _assembly.testFeedbacks ? _sessionFeedbacks : nullptr, feedback](bool written) {
+        if (!written) books.move(FeedbackFate::Open, FeedbackFate::RefusedAppend, 1);
+        if (kept) queue->async([kept, feedback] { kept->push_back(feedback); });
+    };
+    auto notOpen = [&books] { books.move(FeedbackFate::Open, FeedbackFate::NoContainer, 1); };
+    _storageHandle->writeFeedback(std::move(feedback), platform::Reply<bool>(std::move(done), std::move(notOpen)));
 }
 
 void ClientSession::sessionComplete()

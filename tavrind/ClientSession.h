@@ -22,33 +22,34 @@ struct TavrinFeedback;
 class ClientSession;
 class FileContainer;
 
-/// What a session manager keeps: one session, or one for each user agent. Any thread.
+/// The current session of a manager: one session, or one for each user agent. Any thread.
 class Session {
 public:
     virtual ~Session() = default;
-    virtual void addFeedback(std::shared_ptr<TavrinFeedback> feedback) = 0;
-    /// The GUID that the session began under.
+    /// Adds an event. `call` (may be null) is the client's call that reported it: it is released once the event is
+    /// written or dropped.
+    virtual void addFeedback(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call = {}) = 0;
+    /// The GUID under which the session began.
     [[nodiscard]] virtual const platform::Uuid& userGuid() const = 0;
-    /// The feedback kept in memory, oldest first.
+    /// The events kept in memory, oldest first.
     [[nodiscard]] virtual std::vector<std::shared_ptr<TavrinFeedback>> getSessionFeedbacks() = 0;
-    /// The same as dictionaries, with milliseconds since the first.
+    /// The same events as dictionaries, with milliseconds since the first.
     [[nodiscard]] virtual platform::Value::Array feedbacksWithRelativeTimestamp() = 0;
-    /// Calls back with each session of a user agent; `last` with the last one.
+    /// Calls back with the session of each user agent; `last` is true for the final one.
     virtual void enumerateSessions(const std::function<void(ClientSession& session, bool last)>& callback) = 0;
 };
 
-/// One session of one user agent: what the user saw and did, written to a file of its own as it comes, until the
-/// session is complete.
-/// (`StoredSession` is what its file gives.) Any thread.
+/// One session of one user agent. Its events are written to a file of its own as they come, until the session is
+/// complete; `StoredSession` is that file read back. Any thread.
 class ClientSession final : public Session {
 public:
-    /// A new session that begins with `feedback`, which gives it its agent and GUID. Makes its file.
+    /// Begins a session with `feedback`, whose agent and GUID become the session's, and creates its file.
     ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback> feedback,
-                  std::int64_t previousSessionEndReason = 0);
+                  std::int64_t previousSessionEndReason = 0, std::shared_ptr<void> call = {});
     ~ClientSession() override;
 
-    void addFeedback(std::shared_ptr<TavrinFeedback> feedback) override;
-    /// Ends the session: its file is closed, and waits for its upload.
+    void addFeedback(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call = {}) override;
+    /// Ends the session: its file is closed and waits for its upload.
     void sessionComplete();
     [[nodiscard]] const platform::Uuid& userGuid() const override { return _header.userGuid; }
     std::vector<std::shared_ptr<TavrinFeedback>> getSessionFeedbacks() override;
@@ -61,12 +62,12 @@ public:
     [[nodiscard]] const ClientSessionHeader& header() const { return _header; }
     [[nodiscard]] const std::string& agent() const { return _header.agent; }
 
-    /// A session whose only record is an error of the daemon's; the caller completes it.
+    /// Creates a session whose only record is an error of the daemon; the caller completes it.
     [[nodiscard]] static std::shared_ptr<ClientSession> createFeedbackSessionFromError(const platform::Error& error,
                                                                                        Assembly& assembly);
 
 private:
-    void _write(std::shared_ptr<TavrinFeedback> feedback);
+    void _write(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call);
     // On the assembly's dateQueue.
     [[nodiscard]] bool _firstUseOfTheDay();
     [[nodiscard]] bool _updateFirstUseDate();
@@ -75,13 +76,13 @@ private:
     ClientSessionHeader _header;
     std::shared_ptr<FileContainer> _storageHandle;
     std::shared_ptr<platform::Queue> _sessionQueue;
-    /// On the queue; shared with the writes under way. Filled only where the assembly's testFeedbacks asks for it.
+    /// On the queue; shared with the writes under way. Filled only if the assembly's `testFeedbacks` is set.
     std::shared_ptr<std::vector<std::shared_ptr<TavrinFeedback>>> _sessionFeedbacks;
 };
 
-/// The user default that holds the day of a client's last session; none for a client that isn't followed.
+/// Returns the user default that holds the date of a client's last first use; nothing for an untracked client.
 [[nodiscard]] std::optional<std::string> firstUseKey(std::string_view userAgent);
-/// The client that such a key counts for in the statistics; none for a key of no client.
+/// Returns the client that such a key counts for in the statistics; nothing for a key of no client.
 [[nodiscard]] std::optional<std::string_view> dailyActiveClient(std::string_view firstUseKey);
 
 } // namespace tavrin

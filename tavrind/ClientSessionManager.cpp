@@ -41,8 +41,9 @@ const platform::Log& log()
 
 /// An event on its way through the state machine.
 struct ClientSessionManager::Occasion {
-    std::shared_ptr<TavrinFeedback> feedback;
-    std::move_only_function<void()> callback;
+    std::shared_ptr<TavrinFeedback> feedback{};
+    std::shared_ptr<void> call{};
+    std::move_only_function<void()> callback{};
 };
 
 struct ClientSessionManager::Transition {
@@ -87,10 +88,10 @@ ClientSessionManager::ClientSessionManager(Assembly& assembly, std::shared_ptr<T
 
 ClientSessionManager::~ClientSessionManager() = default;
 
-void ClientSessionManager::addTavrinFeedback(std::shared_ptr<TavrinFeedback> feedback)
+void ClientSessionManager::addTavrinFeedback(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call)
 {
-    _sessionQueue->async([self = shared_from_this(), feedback = std::move(feedback)]() mutable {
-        self->_takeFeedback(std::move(feedback));
+    _sessionQueue->async([self = shared_from_this(), feedback = std::move(feedback), call = std::move(call)]() mutable {
+        self->_takeFeedback(std::move(feedback), std::move(call));
     });
 }
 
@@ -103,7 +104,7 @@ bool ClientSessionManager::_wantsFeedback(const TavrinFeedback& feedback) const
     return !bag || TAVBag(bag->rawBag(), feedback.userAgent).feedbackEnabled();
 }
 
-void ClientSessionManager::_takeFeedback(std::shared_ptr<TavrinFeedback> feedback)
+void ClientSessionManager::_takeFeedback(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call)
 {
     if (!_wantsFeedback(*feedback)) return _assembly.feedbackBooks.record(FeedbackFate::FeedbackOff);
     const platform::Uuid guid = _guidController->currentUserGUID();
@@ -118,15 +119,13 @@ void ClientSessionManager::_takeFeedback(std::shared_ptr<TavrinFeedback> feedbac
         event = SessionEvent::Engagement;
     else if (_currentState == SoftLimit && _expirationTime <= now)
         event = SessionEvent::Idle;
-    _updateState(std::move(feedback), event);
+    _updateState(event, {.feedback = std::move(feedback), .call = std::move(call)});
     _expirationTime = now + kIdleTime;
 }
 
-void ClientSessionManager::_updateState(std::shared_ptr<TavrinFeedback> feedback, SessionEvent event,
-                                        std::move_only_function<void()> callback)
+void ClientSessionManager::_updateState(SessionEvent event, Occasion occasion)
 {
     _sessionQueue->assertOnQueue();
-    Occasion occasion{std::move(feedback), std::move(callback)};
     bool known = false;
     for (const Transition& transition : kTransitions) {
         if (transition.event != event) continue;
@@ -146,12 +145,12 @@ void ClientSessionManager::_nothing(Occasion&) {}
 
 void ClientSessionManager::_add(Occasion& occasion)
 {
-    _session->addFeedback(std::move(occasion.feedback));
+    _session->addFeedback(std::move(occasion.feedback), std::move(occasion.call));
 }
 
 void ClientSessionManager::_begin(Occasion& occasion)
 {
-    _setNewSession(std::move(occasion.feedback));
+    _setNewSession(occasion);
 }
 
 void ClientSessionManager::_endMaxTime(Occasion&)
@@ -185,33 +184,35 @@ void ClientSessionManager::_endIdleAndBegin(Occasion& occasion)
     });
     _guidController->reset();
     occasion.feedback->userGuid = _guidController->currentUserGUID().string();
-    _setNewSession(std::move(occasion.feedback));
+    _setNewSession(occasion);
 }
 
 void ClientSessionManager::_endGuidChangedAndBegin(Occasion& occasion)
 {
     _flushSessionWithReason(SessionEndReason::GuidChanged,
                             [this] { log().log("session flushed because guid changed {}", _identifier); });
-    _setNewSession(std::move(occasion.feedback));
+    _setNewSession(occasion);
 }
 
 void ClientSessionManager::_endEngagement(Occasion& occasion)
 {
-    _session->addFeedback(std::move(occasion.feedback));
+    _session->addFeedback(std::move(occasion.feedback), std::move(occasion.call));
     _flushSessionWithReason(SessionEndReason::EngagementReceived, [] {
         log().log("session flushed because soft limit reached and sentinel feedback received");
     });
     _guidController->reset();
 }
 
-void ClientSessionManager::_setNewSession(std::shared_ptr<TavrinFeedback> feedback)
+void ClientSessionManager::_setNewSession(Occasion& occasion)
 {
     const std::uint64_t counter = ++_sessionCounter;
     const auto previousReason = static_cast<std::int64_t>(_flushReason);
     if (_assembly.sharedSession)
-        _session = std::make_shared<ClientSessionShared>(_assembly, std::move(feedback), previousReason);
+        _session = std::make_shared<ClientSessionShared>(_assembly, std::move(occasion.feedback), previousReason,
+                                                         std::move(occasion.call));
     else
-        _session = std::make_shared<ClientSession>(_assembly, std::move(feedback), previousReason);
+        _session = std::make_shared<ClientSession>(_assembly, std::move(occasion.feedback), previousReason,
+                                                   std::move(occasion.call));
     log().log("new session id {} {}", counter, _identifier);
 
     _sessionQueue->after(kSoftLimit, [weak = weak_from_this(), counter] {
@@ -225,13 +226,13 @@ void ClientSessionManager::_setNewSession(std::shared_ptr<TavrinFeedback> feedba
 void ClientSessionManager::_onUserGuidSoftLimitReached()
 {
     if (!_session) return;
-    _updateState(nullptr, SessionEvent::SoftLimit);
+    _updateState(SessionEvent::SoftLimit, {});
     log().log("soft limit reached, maxtimer session id {} {}", _sessionCounter, _identifier);
     _sessionQueue->after(kFromSoftLimitToMaxTime, [weak = weak_from_this(), counter = _sessionCounter] {
         const auto self = weak.lock();
         if (!self) return;
         log().debug("max timer expired expected {} current {}", counter, self->_sessionCounter);
-        if (self->_sessionCounter == counter && self->_session) self->_updateState(nullptr, SessionEvent::MaxTime);
+        if (self->_sessionCounter == counter && self->_session) self->_updateState(SessionEvent::MaxTime, {});
     });
 }
 
@@ -270,7 +271,7 @@ platform::Date ClientSessionManager::expirationTime()
 void ClientSessionManager::externalEvent(SessionEvent event, std::move_only_function<void()> callback)
 {
     _sessionQueue->async([self = shared_from_this(), event, callback = std::move(callback)]() mutable {
-        self->_updateState(nullptr, event, std::move(callback));
+        self->_updateState(event, {.callback = std::move(callback)});
     });
 }
 

@@ -22,11 +22,11 @@ enum class SessionEndReason : std::int64_t;
 
 enum class SessionState : unsigned {
     Open,
-    SoftLimit, ///< open for ten minutes: it ends at the next good moment
+    SoftLimit, ///< open for ten minutes; the next engagement, idleness or five more minutes end it
     None,      ///< there is no session
 };
 
-/// What moves a session on. The numbers are known outside; there is no 4.
+/// What changes a session's state. The numbers are known outside; 4 is unused.
 enum class SessionEvent : unsigned {
     AddFeedback = 0,
     SoftLimit = 1,
@@ -48,34 +48,35 @@ enum class SessionEvent : unsigned {
 ///      │                  │ another GUID                 │ 5 more minutes, and as on the left
 ///      └──────────────────┴──────────────────────────────┘
 ///
-/// A session that another GUID or idleness ended is followed at once by the next, which begins with the feedback at
-/// hand. Ended by idleness or an engagement, the GUID is rolled. Every session knows why the one before it ended.
+/// A session that ends because of another GUID or idleness is followed at once by the next, which begins with the
+/// feedback at hand. Idleness and engagements also reset the GUID. Every session stores why the previous one ended.
 ///
-/// All of it happens on one queue, on which the timers fire and the callbacks run. Any thread.
+/// State is confined to one queue; timers and callbacks run there. Any thread.
 class ClientSessionManager : public std::enable_shared_from_this<ClientSessionManager> {
 public:
-    /// `identifier` is used in log lines.
+    /// `identifier` is for log lines.
     ClientSessionManager(Assembly& assembly, std::shared_ptr<TavrinUserGUIDController> guidController,
                          std::string identifier);
     virtual ~ClientSessionManager();
 
-    /// Takes an event, soon, and stamps it with the current GUID. Dropped where the bag wants no feedback.
-    virtual void addTavrinFeedback(std::shared_ptr<TavrinFeedback> feedback);
-    /// The current session; null for none. Waits for the queue.
+    /// Adds an event to the session, asynchronously, and stamps it with the current GUID. Drops it if the bag switches
+    /// feedback off. `call` (may be null) is released once the event is written or dropped.
+    virtual void addTavrinFeedback(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call = {});
+    /// The current session, or null. Blocks on the queue.
     [[nodiscard]] std::shared_ptr<Session> session();
-    /// Moves the session on, soon, by an event that needs no feedback: those of memory pressure have no source here,
-    /// and a number that is none is logged and ignored. An external flush calls back once it is done.
+    /// Applies an event that comes without feedback, asynchronously. Events of memory pressure have no source yet;
+    /// unknown numbers are logged and ignored. An external flush calls back when it is done.
     void externalEvent(SessionEvent event, std::move_only_function<void()> callback = {});
-    /// Ends the session, soon, then calls back.
+    /// Ends the session, asynchronously, then calls back.
     void flushSession(std::move_only_function<void()> callback)
     {
         externalEvent(SessionEvent::ExternalFlush, std::move(callback));
     }
-    /// A connection has gone. With a shared session that is an event like others, and the callback gets false; else the
-    /// session is flushed, then it gets true.
+    /// Handles the end of a connection. A shared session records an event, and the callback gets false. Any other
+    /// session is flushed, then the callback gets true.
     void flushSessionInvalidation(const std::string& userAgent, std::move_only_function<void(bool flushed)> callback);
 
-    // For diagnostics and tests; they wait for the queue.
+    // For diagnostics and tests; these block on the queue.
     [[nodiscard]] SessionState currentState();
     [[nodiscard]] platform::Date expirationTime();
 
@@ -85,10 +86,10 @@ public:
 
     /// The daemon's own user agent, "tavrind/VERSION".
     [[nodiscard]] static const std::string& tavrindUserAgent();
-    /// An error of the daemon's as a feedback record of the current user.
+    /// Wraps an error of the daemon as feedback of the current user.
     [[nodiscard]] static std::shared_ptr<TavrinFeedback> errorFeedback(const platform::Error& error,
                                                                        Assembly& assembly);
-    /// Hands that record to the assembly's session manager, if there is one yet.
+    /// Adds that record to the assembly's session manager, if there is one yet.
     static void reportErrorAsTavrindFeedback(const platform::Error& error, Assembly& assembly);
 
 private:
@@ -97,10 +98,9 @@ private:
     static const Transition kTransitions[];
 
     [[nodiscard]] bool _wantsFeedback(const TavrinFeedback& feedback) const;
-    void _takeFeedback(std::shared_ptr<TavrinFeedback> feedback);
-    void _updateState(std::shared_ptr<TavrinFeedback> feedback, SessionEvent event,
-                      std::move_only_function<void()> callback = {});
-    void _setNewSession(std::shared_ptr<TavrinFeedback> feedback);
+    void _takeFeedback(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call);
+    void _updateState(SessionEvent event, Occasion occasion);
+    void _setNewSession(Occasion& occasion);
     void _onUserGuidSoftLimitReached();
     void _flushSessionWithReason(SessionEndReason reason, std::move_only_function<void()> callback);
 
@@ -122,7 +122,7 @@ private:
     std::shared_ptr<platform::Queue> _sessionQueue; // guards all below
     std::shared_ptr<Session> _session;
     SessionState _currentState = SessionState::None;
-    std::uint64_t _sessionCounter = 0; ///< sessions begun; timers of an earlier session know it by this
+    std::uint64_t _sessionCounter = 0; ///< sessions begun; timers of an earlier session are ignored by it
     SessionEndReason _flushReason{};   ///< of the last session
     platform::Date _expirationTime;    ///< when the session counts as idle
 };

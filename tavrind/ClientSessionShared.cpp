@@ -9,26 +9,27 @@
 namespace tavrin {
 
 ClientSessionShared::ClientSessionShared(Assembly& assembly, std::shared_ptr<TavrinFeedback> feedback,
-                                         std::int64_t previousSessionEndReason)
+                                         std::int64_t previousSessionEndReason, std::shared_ptr<void> call)
     : _assembly(assembly), _userGuid(platform::Uuid::parse(feedback->userGuid).value_or(platform::Uuid())),
       _previousSessionEndReason(previousSessionEndReason),
       _sessionQueue(assembly.device.serialQueue("com.quorvane.tavrind.clientSessionSharedQueue"))
 {
-    _begin(std::move(feedback));
+    _begin(std::move(feedback), std::move(call));
 }
 
-void ClientSessionShared::_begin(std::shared_ptr<TavrinFeedback> feedback)
+void ClientSessionShared::_begin(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call)
 {
     const std::string agent = feedback->userAgent;
-    _sessionMap[agent] = std::make_shared<ClientSession>(_assembly, std::move(feedback), _previousSessionEndReason);
+    _sessionMap[agent] =
+        std::make_shared<ClientSession>(_assembly, std::move(feedback), _previousSessionEndReason, std::move(call));
 }
 
-void ClientSessionShared::addFeedback(std::shared_ptr<TavrinFeedback> feedback)
+void ClientSessionShared::addFeedback(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call)
 {
-    _sessionQueue->async([self = shared_from_this(), feedback = std::move(feedback)]() mutable {
+    _sessionQueue->async([self = shared_from_this(), feedback = std::move(feedback), call = std::move(call)]() mutable {
         const auto found = self->_sessionMap.find(feedback->userAgent);
-        if (found == self->_sessionMap.end()) return self->_begin(std::move(feedback));
-        found->second->addFeedback(std::move(feedback));
+        if (found == self->_sessionMap.end()) return self->_begin(std::move(feedback), std::move(call));
+        found->second->addFeedback(std::move(feedback), std::move(call));
     });
 }
 

@@ -8,26 +8,26 @@
 
 namespace tavrin {
 
-/// One session that all clients share: a `ClientSession` for each user agent that has reported, all begun under one
-/// GUID. Any thread.
+/// The session that all clients share: a `ClientSession` for each user agent that has reported, all under one GUID. Any
+/// thread.
 class ClientSessionShared final : public Session, public std::enable_shared_from_this<ClientSessionShared> {
 public:
-    /// Begins with `feedback`, and the session of its user agent.
+    /// Begins with `feedback` and the session of its user agent.
     ClientSessionShared(Assembly& assembly, std::shared_ptr<TavrinFeedback> feedback,
-                        std::int64_t previousSessionEndReason);
+                        std::int64_t previousSessionEndReason, std::shared_ptr<void> call = {});
 
-    /// Soon, to the session of the feedback's user agent.
-    void addFeedback(std::shared_ptr<TavrinFeedback> feedback) override;
+    /// Adds the event to the session of its user agent, asynchronously.
+    void addFeedback(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call = {}) override;
     [[nodiscard]] const platform::Uuid& userGuid() const override { return _userGuid; }
-    /// Those of one user agent behind those of another; the same holds below.
+    // Session after session, in the order of the user agents.
     std::vector<std::shared_ptr<TavrinFeedback>> getSessionFeedbacks() override;
     platform::Value::Array feedbacksWithRelativeTimestamp() override;
     void enumerateSessions(const std::function<void(ClientSession& session, bool last)>& callback) override;
 
 private:
-    /// What `collect` answers for each session, joined.
+    /// Joins what `collect` returns for each session.
     template <class List> List _joined(List (ClientSession::*collect)());
-    void _begin(std::shared_ptr<TavrinFeedback> feedback);
+    void _begin(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call);
 
     Assembly& _assembly;
     const platform::Uuid _userGuid;

@@ -4,7 +4,6 @@
 #include <array>
 #include <bit>
 #include <exception>
-#include <unistd.h>
 
 #include "platform/files/Files.h"
 #include "platform/run/Queue.h"
@@ -63,9 +62,8 @@ std::shared_ptr<platform::Record> readNext(ArchivedDataIterator& records)
 
 } // namespace
 
-FileContainer::FileContainer(std::shared_ptr<const FileContainerStore> store, std::filesystem::path fileUrl,
-                             std::uint64_t feedbackCount)
-    : _store(std::move(store)), _fileUrl(std::move(fileUrl)), _feedbackCount(feedbackCount)
+FileContainer::FileContainer(std::shared_ptr<const FileContainerStore> store, std::filesystem::path fileUrl)
+    : _store(std::move(store)), _fileUrl(std::move(fileUrl))
 {}
 
 FileContainer::FileContainer(std::shared_ptr<const FileContainerStore> store, std::filesystem::path fileUrl,
@@ -89,16 +87,13 @@ void FileContainer::writeSessionHeader(ClientSessionHeader header)
     });
 }
 
-void FileContainer::writeFeedback(std::shared_ptr<const TavrinFeedback> feedback, std::move_only_function<void()> done)
+void FileContainer::writeFeedback(std::shared_ptr<const TavrinFeedback> feedback, platform::Reply<bool> done)
 {
     _store->queue->async([self = shared_from_this(), feedback = std::move(feedback), done = std::move(done)]() mutable {
-        FeedbackBooks& books = self->_store->books;
-        if (!self->_fileHandle) return books.move(FeedbackFate::Open, FeedbackFate::NoContainer, 1);
-        if (self->_archiveObject(*feedback))
-            ++self->_feedbackCount;
-        else
-            books.move(FeedbackFate::Open, FeedbackFate::RefusedAppend, 1);
-        if (done) done();
+        if (!self->_fileHandle) return done.abandon();
+        const bool written = self->_archiveObject(*feedback);
+        if (written) ++self->_feedbackCount;
+        if (done) done(written);
     });
 }
 
@@ -128,10 +123,7 @@ bool FileContainer::_append(const std::string& archive)
 
 void FileContainer::close()
 {
-    _store->queue->async([self = shared_from_this()] {
-        self->closeFile();
-        self->_store->books.move(FeedbackFate::Open, FeedbackFate::Closed, self->_feedbackCount);
-    });
+    _store->queue->async([self = shared_from_this()] { self->closeFile(); });
 }
 
 void FileContainer::closeFile()
@@ -142,19 +134,18 @@ void FileContainer::closeFile()
     _fileHandle.reset();
 }
 
-std::shared_ptr<StoredSession> FileContainer::read()
+FileReading FileContainer::read()
 {
     return _store->queue->sync([this] { return _read(); });
 }
 
-std::shared_ptr<StoredSession> FileContainer::_notRead(FeedbackFate fate, const std::string& text)
+FileReading FileContainer::_notRead(FeedbackFate fate, const std::string& text) const
 {
     log().error("{}", text);
-    _store->books.move(FeedbackFate::Closed, fate, std::exchange(_feedbackCount, 0));
-    return nullptr;
+    return {.session = nullptr, .lost = _feedbackCount, .fate = fate};
 }
 
-std::shared_ptr<StoredSession> FileContainer::_read()
+FileReading FileContainer::_read()
 {
     log().debug("reading file url {}", _fileUrl.string());
     if (_fileHandle) {
@@ -182,7 +173,7 @@ std::shared_ptr<StoredSession> FileContainer::_read()
     }
 }
 
-std::shared_ptr<StoredSession> FileContainer::_unarchiveObject(const Bytes& data)
+FileReading FileContainer::_unarchiveObject(const Bytes& data)
 {
     _store->queue->assertOnQueue();
     if (data.size() > UINT32_MAX) return _notRead(FeedbackFate::Unreadable, "erroneous file data length");
@@ -208,27 +199,20 @@ std::shared_ptr<StoredSession> FileContainer::_unarchiveObject(const Bytes& data
         }
         feedbacks.push_back(std::move(feedback));
     }
-    if (feedbacks.size() < _feedbackCount)
-        _store->books.move(FeedbackFate::Closed, FeedbackFate::DamagedTail,
-                           std::exchange(_feedbackCount, feedbacks.size()) - feedbacks.size());
-    return std::make_shared<StoredSession>(*header, std::move(feedbacks));
+    const std::uint64_t lost = _feedbackCount - std::min<std::uint64_t>(_feedbackCount, feedbacks.size());
+    return {.session = std::make_shared<StoredSession>(*header, std::move(feedbacks)),
+            .lost = lost,
+            .fate = FeedbackFate::DamagedTail};
 }
 
-std::uint64_t FileContainer::countFeedback(const FileContainerStore& store, const std::filesystem::path& fileUrl)
+void FileContainer::countFeedback()
 {
-    const auto file = store.files.openForReading(fileUrl);
-    const auto attributes = store.files.info(fileUrl);
-    if (!file || !attributes) return 0;
-    const std::uint64_t end = std::min(attributes->size, store.maxFileSize);
-    std::uint64_t position = 0;
-    std::uint64_t count = 0;
-    std::uint64_t length = 0;
-    while (pread(file->fd(), &length, sizeof(length), static_cast<off_t>(position)) == sizeof(length) && length > 0 &&
-           position + sizeof(length) < end && length <= end - position - sizeof(length)) {
-        position += sizeof(length) + length;
-        ++count;
-    }
-    return count > 2 ? count - 2 : 0; // the version and the header
+    _store->queue->assertOnQueue();
+    constexpr std::uint64_t kHead = 2; // the version and the session's header
+    const auto file = _store->files.openForReading(_fileUrl);
+    const auto data = file ? mmapFileHandle(*file) : std::unexpected(file.error());
+    const std::uint64_t records = data ? ArchivedDataIterator(*data).countRecords() : 0;
+    _feedbackCount = records - std::min(records, kHead);
 }
 
 } // namespace tavrin

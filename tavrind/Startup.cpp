@@ -75,8 +75,8 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device)
     assembly.requestFactory = TAVNetworkRequestFactory::make(assembly);
     assembly.subscriptionManager = TavrinSubscriptionManager::make(assembly, assembly.requestFactory);
     assembly.downloadManager = DownloadManager::make(assembly);
-    assembly.persistentStorage = std::make_shared<TavrinPersistentStorage>(assembly);
-    assembly.crowdsourcingFeedbackFlusher = TavrinFeedbackFlusher::make(assembly, 0);
+    assembly.persistentStorage = TavrinPersistentStorage::make(assembly);
+    assembly.crowdsourcingFeedbackFlusher = TavrinFeedbackFlusher::make(assembly, FlusherIdentity::Crowdsourcing);
     assembly.backgroundFlusher = BackgroundActivitiesManager::make(assembly);
     assembly.downloadURLSession = device.backgroundSessions.make(
         {.identifier = "com.quorvane.tavrind", .allowsMetered = false, .resourceTimeout = 24h, .caFile = caFile()},

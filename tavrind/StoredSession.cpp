@@ -4,6 +4,8 @@
 #include <utility>
 
 #include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
+#include "tavrind/OutputStream.h"
 #include "tavrind/SessionProcessingHelper.h"
 #include "tavrind/TavrinFeedback.h"
 #include "tavrind/TavrinSessionFeedback.h"
@@ -17,52 +19,36 @@ namespace {
 
 using Feedbacks = std::vector<std::shared_ptr<TavrinFeedback>>;
 
-/// A session's events as they are uploaded, one by one: in order, with identifiers replaced, and at the end what they
-/// refer to and none showed.
-class UploadedEvents {
+/// Writes a session object piece by piece, so that a long session is never in memory as one text.
+class SessionWriter {
 public:
-    UploadedEvents(Feedbacks feedbacks, const ClientSessionHeader& header)
-        : _feedbacks(std::move(feedbacks)), _userGuid(header.userGuid.isNil() ? "" : header.userGuid.string()),
-          _agent(header.agent), _base(_feedbacks.empty() ? 0 : _feedbacks.front()->timestamp())
-    {}
+    explicit SessionWriter(OutputStream& stream) : _stream(stream) { _write(R"({"fb":[)"); }
 
-    std::optional<Dictionary> next()
+    void event(Dictionary event)
     {
-        if (_next < _feedbacks.size()) {
-            const auto feedback = std::exchange(_feedbacks[_next++], nullptr);
-            _lastTimestamp = mach_duration_to_milliseconds(feedback->timestamp() - _base);
-            feedback->process(_helper);
-            feedback->relTimestamp = _lastTimestamp;
-            return feedback->dictionary();
+        if (std::exchange(_hasEvents, true)) _write(",");
+        _write(platform::toJson(std::move(event)));
+    }
+    /// Returns false if the stream has failed.
+    bool finish(const Dictionary& rest)
+    {
+        _write("]");
+        for (const auto& [key, value] : rest) {
+            _write(",");
+            _write(platform::toJson(key));
+            _write(":");
+            _write(platform::toJson(value));
         }
-        if (!std::exchange(_resultsAsked, true)) {
-            if (auto results = _helper.missingResults(); !results.empty())
-                return lastly(std::make_shared<TavrinSessionMissingResults>(std::move(results)));
-        }
-        if (!std::exchange(_suggestionsAsked, true)) {
-            if (auto suggestions = _helper.missingSuggestions(); !suggestions.empty())
-                return lastly(std::make_shared<TavrinSessionMissingSuggestions>(std::move(suggestions)));
-        }
-        return std::nullopt;
+        _write("}");
+        return _good;
     }
 
 private:
-    [[nodiscard]] Dictionary lastly(std::shared_ptr<ZRFeedback> record) const
-    {
-        TavrinFeedback feedback(std::move(record), 0, _userGuid, _agent);
-        feedback.relTimestamp = _lastTimestamp;
-        return feedback.dictionary();
-    }
+    void _write(std::string_view text) { _good = _good && _stream.write(text) >= 0; }
 
-    Feedbacks _feedbacks;
-    std::string _userGuid;
-    std::string _agent;
-    std::uint64_t _base;
-    std::uint64_t _lastTimestamp = 0;
-    std::size_t _next = 0;
-    bool _resultsAsked = false; // for what is missing
-    bool _suggestionsAsked = false;
-    SessionProcessingHelper _helper;
+    OutputStream& _stream;
+    bool _good = true;
+    bool _hasEvents = false;
 };
 
 } // namespace
@@ -79,26 +65,58 @@ StoredSession::StoredSession(ClientSessionHeader header, Feedbacks feedbacks)
 
 StoredSession::~StoredSession() = default;
 
-FeedbacksToSend StoredSession::getFeedbacksToSend()
+std::string StoredSession::_userGuid() const
+{
+    return _header.userGuid.isNil() ? "" : _header.userGuid.string();
+}
+
+std::string StoredSession::description() const
+{
+    return platform::toJson(_rest());
+}
+
+Dictionary StoredSession::_rest() const
+{
+    Dictionary rest{{"agent", _header.agent}, {"user_guid", _userGuid()}};
+    if (!_header.resourceVersions.asDictionary()) return rest;
+    rest.set("resource_versions", _header.resourceVersions);
+    rest.set("first_use", _header.firstUse);
+    const bool hidden = _header.removeTimestamps || !_header.baseTime;
+    rest.set("base_time", hidden ? 0 : static_cast<std::int64_t>(platform::secondsSince1970(*_header.baseTime)));
+    const Value& reason = TavrinSessionEndFeedback::triggerEventEnumToString(
+        static_cast<SessionEndReason>(_header.previousSessionEndReason));
+    if (!reason.isNull()) rest.set("previous_session_end_reason", reason);
+    return rest;
+}
+
+std::optional<std::size_t> StoredSession::getFeedbacksToSend(OutputStream& stream)
 {
     Feedbacks feedbacks = std::exchange(_feedbacks, {});
     sortByTimestamp(feedbacks);
-    auto events = std::make_unique<UploadedEvents>(std::move(feedbacks), _header);
-    FeedbacksToSend upload{.nextEvent = [events = std::move(events)] { return events->next(); }};
+    const std::uint64_t base = feedbacks.empty() ? 0 : feedbacks.front()->timestamp();
+    std::uint64_t timestamp = 0;
 
-    Dictionary rest{{"agent", _header.agent}, {"user_guid", _header.userGuid.isNil() ? "" : _header.userGuid.string()}};
-    // The list ends at the first missing value.
-    if (_header.resourceVersions.asDictionary()) {
-        rest.set("resource_versions", _header.resourceVersions);
-        rest.set("first_use", _header.firstUse);
-        const bool hidden = _header.removeTimestamps || !_header.baseTime;
-        rest.set("base_time", hidden ? 0 : static_cast<std::int64_t>(platform::secondsSince1970(*_header.baseTime)));
-        const Value& reason = TavrinSessionEndFeedback::triggerEventEnumToString(
-            static_cast<SessionEndReason>(_header.previousSessionEndReason));
-        if (!reason.isNull()) rest.set("previous_session_end_reason", reason);
+    SessionWriter writer(stream);
+    SessionProcessingHelper helper;
+    for (auto& next : feedbacks) {
+        const auto feedback = std::exchange(next, nullptr);
+        timestamp = mach_duration_to_milliseconds(feedback->timestamp() - base);
+        feedback->relTimestamp = timestamp;
+        feedback->process(helper);
+        writer.event(feedback->dictionary());
     }
-    upload.rest = std::move(rest);
-    return upload;
+    const auto last = [&](std::shared_ptr<ZRFeedback> record) {
+        TavrinFeedback feedback(std::move(record), 0, _userGuid(), _header.agent);
+        feedback.relTimestamp = timestamp;
+        writer.event(feedback.dictionary());
+    };
+    if (auto results = helper.missingResults(); !results.empty())
+        last(std::make_shared<TavrinSessionMissingResults>(std::move(results)));
+    if (auto suggestions = helper.missingSuggestions(); !suggestions.empty())
+        last(std::make_shared<TavrinSessionMissingSuggestions>(std::move(suggestions)));
+
+    const Dictionary rest = _rest();
+    return writer.finish(rest) ? std::optional(1 + rest.size()) : std::nullopt;
 }
 
 } // namespace tavrin

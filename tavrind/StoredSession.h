@@ -4,31 +4,41 @@
 #include <vector>
 
 #include "tavrind/ClientSessionHeader.h"
-#include "tavrind/FeedbacksToSend.h"
+#include "tavrind/Flushable.h"
+
+namespace platform {
+class Dictionary;
+}
 
 namespace tavrin {
 
 struct TavrinFeedback;
 
-/// Sorts events oldest first; those of one moment keep their order.
+/// Sorts events oldest first; those with equal timestamps keep their order.
 void sortByTimestamp(std::vector<std::shared_ptr<TavrinFeedback>>& feedbacks);
 
-/// A session as its file has it, on its way to the service. One thread at a time.
+/// A session read back from its file, ready for upload. One thread at a time.
 class StoredSession final : public Flushable {
 public:
     StoredSession(ClientSessionHeader header, std::vector<std::shared_ptr<TavrinFeedback>> feedbacks);
     ~StoredSession() override;
 
-    /// The upload: events in order, with milliseconds since the first and with identifiers replaced; behind them what
-    /// they refer to and none showed. Entries behind the first one that is missing are left out. Gives the events away.
-    [[nodiscard]] FeedbacksToSend getFeedbacksToSend() override;
+    /// Writes the session object of docs/feedback.md: its events oldest first, with milliseconds since the first and
+    /// with identifiers replaced, then what they refer to and none shows. The keys end at the first missing value. Each
+    /// event is released once it is written.
+    [[nodiscard]] std::optional<std::size_t> getFeedbacksToSend(OutputStream& stream) override;
     [[nodiscard]] std::size_t recordedEvents() const override { return _recordedEvents; }
+    [[nodiscard]] std::string description() const override;
 
     [[nodiscard]] const ClientSessionHeader& header() const { return _header; }
-    /// As the file has them, until they are given away.
+    /// The events in the order of the file, until they are given away.
     [[nodiscard]] const std::vector<std::shared_ptr<TavrinFeedback>>& feedbacks() const { return _feedbacks; }
 
 private:
+    /// The keys after "fb".
+    [[nodiscard]] platform::Dictionary _rest() const;
+    [[nodiscard]] std::string _userGuid() const;
+
     ClientSessionHeader _header;
     std::vector<std::shared_ptr<TavrinFeedback>> _feedbacks;
     std::size_t _recordedEvents;

@@ -27,12 +27,10 @@ struct HostTimebase {
 struct TavrinFeedback : platform::RecordOf<TavrinFeedback> {
     static constexpr std::string_view kClass = "TavrinFeedback";
 
-    std::int64_t queryId = 0;       ///< the daemon's query that the event belongs to
-    std::uint64_t relTimestamp = 0; ///< milliseconds since the session's first event; set on the way out
-    std::string userGuid;           ///< in force when the event was recorded; empty before the session sets it
-    std::string userAgent;          ///< of the client
-    /// The call that reported the event, answered when the last copy of this goes; null for most. Not stored.
-    std::shared_ptr<void> call;
+    std::int64_t queryId = 0;        ///< the daemon's query that the event belongs to
+    std::uint64_t relTimestamp = 0;  ///< milliseconds since the session's first event; set on the way out
+    std::string userGuid;            ///< in force when the event was recorded; empty before the session sets it
+    std::string userAgent;           ///< of the client
     std::uint64_t clientQueryId = 0; ///< the client's own query id; 0 for none
 
     TavrinFeedback();

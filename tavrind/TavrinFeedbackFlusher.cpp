@@ -32,7 +32,7 @@ constexpr std::size_t kMaximumPath = 1024;
 constexpr int kMaximumNameAttempts = 16;
 constexpr std::size_t kLongestLoggedObject = 200; // bytes
 
-// Records that go out on their own wait in memory for the next pass, ten minutes or longer.
+// Records that are sent on their own wait in memory for the next pass, for ten minutes or longer.
 constexpr std::size_t kMaximumRecords = 1000;
 constexpr std::size_t kMaximumRecordBytes = 8u << 20; // of JSON text
 
@@ -41,18 +41,23 @@ const platform::Log& log()
     return TavrinLogForCategory(kLogFlusher);
 }
 
-/// A record that goes out on its own, in the JSON that its client made.
+/// A record that is sent on its own, as the JSON that its client made.
 class CustomFeedbackToSend final : public Flushable {
 public:
     explicit CustomFeedbackToSend(std::shared_ptr<ZRCustomFeedback> record) : _record(std::move(record)) {}
-    FeedbacksToSend getFeedbacksToSend() override { return {.rest = _record->jsonFeedback}; }
+    [[nodiscard]] std::optional<std::size_t> getFeedbacksToSend(OutputStream& stream) override
+    {
+        if (!_record->jsonFeedback.asDictionary() || stream.write(description()) < 0) return std::nullopt;
+        return _record->jsonFeedback.count();
+    }
     [[nodiscard]] std::size_t recordedEvents() const override { return 1; }
+    [[nodiscard]] std::string description() const override { return platform::toJson(_record->jsonFeedback); }
 
 private:
     std::shared_ptr<ZRCustomFeedback> _record;
 };
 
-/// A new file of an unguessed name, open.
+/// Creates a file under a name that can't be guessed, and sets `path` to it.
 platform::Result<std::unique_ptr<platform::AppendFile>>
 makeTemporaryFile(platform::FileSystem& files, const std::filesystem::path& directory, std::filesystem::path& path)
 {
@@ -66,48 +71,29 @@ makeTemporaryFile(platform::FileSystem& files, const std::filesystem::path& dire
 
 } // namespace
 
-std::string_view convertIdentifierToString(std::int64_t identifier)
+std::string_view convertIdentifierToString(FlusherIdentity identifier)
 {
-    switch (identifier) {
-    case 0: return "crowdsourcing";
-    case 1: return "Feedbacks";
-    default: return "";
-    }
+    const auto index = static_cast<std::uint64_t>(identifier);
+    return index < kTexts<FlusherIdentity>.size() ? kTexts<FlusherIdentity>[index] : "";
 }
 
 Value UploadNote::value() const
 {
-    return Value::dictionaryOf(
-        {{"flusher", flusher}, {"feedbacks", feedbacks}, {"events", events}, {"process", process}});
+    return Value::dictionaryOf({{"flusher", static_cast<std::int64_t>(flusher)},
+                                {"feedbacks", feedbacks},
+                                {"events", events},
+                                {"process", process}});
 }
 
 UploadNote UploadNote::from(const Value& value)
 {
-    return {.flusher = value["flusher"].asInt().value_or(-1),
+    return {.flusher = static_cast<FlusherIdentity>(value["flusher"].asInt().value_or(-1)),
             .feedbacks = value["feedbacks"].asInt().value_or(0),
             .events = value["events"].asUInt().value_or(0),
             .process = value["process"].asString() ? *value["process"].asString() : ""};
 }
 
-bool writeJson(FeedbacksToSend& feedbacks, OutputStream& stream)
-{
-    if (!feedbacks.rest.asDictionary()) return false;
-    const auto write = [&stream](std::string_view text) { return stream.write(text) >= 0; };
-    if (!feedbacks.nextEvent) return write(platform::toJson(feedbacks.rest));
-
-    bool good = write(R"({"fb":[)");
-    bool first = true;
-    while (good) {
-        auto event = feedbacks.nextEvent();
-        if (!event) break;
-        good = (std::exchange(first, false) || write(",")) && write(platform::toJson(std::move(*event)));
-    }
-    // What is behind "fb" goes on where it ends.
-    const std::string rest = platform::toJson(feedbacks.rest);
-    return good && write("]") && (feedbacks.rest.count() == 0 || write(",")) && write(std::string_view(rest).substr(1));
-}
-
-std::shared_ptr<TavrinFeedbackFlusher> TavrinFeedbackFlusher::make(Assembly& assembly, std::int64_t identifier)
+std::shared_ptr<TavrinFeedbackFlusher> TavrinFeedbackFlusher::make(Assembly& assembly, FlusherIdentity identifier)
 {
     auto flusher = std::make_shared<TavrinFeedbackFlusher>(assembly, identifier);
     flusher->_bagObserver = assembly.notificationCenter.observe(
@@ -118,7 +104,7 @@ std::shared_ptr<TavrinFeedbackFlusher> TavrinFeedbackFlusher::make(Assembly& ass
     return flusher;
 }
 
-TavrinFeedbackFlusher::TavrinFeedbackFlusher(Assembly& assembly, std::int64_t identifier)
+TavrinFeedbackFlusher::TavrinFeedbackFlusher(Assembly& assembly, FlusherIdentity identifier)
     : _assembly(assembly), _identifier(identifier),
       _queueBuffer(
           assembly.device.serialQueue("com.quorvane.tavrind.tavrinDataBufferQueue", platform::Priority::Background)),
@@ -216,13 +202,11 @@ void TavrinFeedbackFlusher::_flushObject(Flushable& object, Bodies* bodies)
     }
     CompressedOutputStream stream(std::make_unique<FileOutputStream>(std::move(*file)));
     stream.open();
-    FeedbacksToSend feedbacks = object.getFeedbacksToSend();
-    const std::size_t count = feedbacks.count();
-    const bool written = writeJson(feedbacks, stream);
+    const auto count = object.getFeedbacksToSend(stream);
     stream.close();
     const auto error = stream.streamError();
-    if (!written || error) { // what there is of the file stays, for whoever looks into it
-        const std::string text = platform::toJson(feedbacks.rest);
+    if (!count || error) { // the file is left where it is
+        const std::string text = object.description();
         log().error("Invalid JSON Object {} error {}", platform::cut(text, kLongestLoggedObject),
                     error ? error->description() : "not a dictionary");
         return drop(error ? FeedbackFate::NoBody : FeedbackFate::NotJson);
@@ -231,7 +215,7 @@ void TavrinFeedbackFlusher::_flushObject(Flushable& object, Bodies* bodies)
     const std::string digest = stream.dataDigestForStream();
     if (bodies) _saveFile(fpath, *bodies);
     if (_serverEndpoint)
-        _upload(fpath, digest, count, events);
+        _upload(fpath, digest, *count, events);
     else
         drop(FeedbackFate::EndpointUnset);
     if (const auto removed = _assembly.fileManager.remove(fpath); removed)
@@ -311,7 +295,7 @@ std::map<std::uint64_t, std::int64_t> TavrinFeedbackFlusher::feedbacksPerTask()
 void TavrinFeedbackFlusher::setEndpoint(std::optional<platform::Url> endpoint)
 {
     _queueBuffer->async([self = shared_from_this(), endpoint = std::move(endpoint)]() mutable {
-        if (endpoint && self->_identifier == 1) {
+        if (endpoint && self->_identifier == FlusherIdentity::Feedbacks) {
             platform::UrlComponents components(*endpoint);
             components.setPercentEncodedQuery("v=2");
             endpoint = components.url();
@@ -332,10 +316,10 @@ std::optional<platform::Url> TavrinFeedbackFlusher::_fetchEndpointFromBag(const 
 {
     if (!bag.feedbackEnabled()) return std::nullopt;
     switch (_identifier) {
-    case 0: return bag.crowdsourcingURL();
-    case 1: return bag.feedbackURL();
-    default: return std::nullopt;
+    case FlusherIdentity::Crowdsourcing: return bag.crowdsourcingURL();
+    case FlusherIdentity::Feedbacks: return bag.feedbackURL();
     }
+    return std::nullopt;
 }
 
 } // namespace tavrin

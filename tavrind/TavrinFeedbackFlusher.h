@@ -13,7 +13,9 @@
 #include "platform/base/Bytes.h"
 #include "platform/net/Url.h"
 #include "platform/run/NotificationCenter.h"
-#include "tavrind/FeedbacksToSend.h"
+#include "platform/values/Value.h"
+#include "searchrecords/ZREnums.h"
+#include "tavrind/Flushable.h"
 
 namespace platform {
 class BackgroundTask;
@@ -24,65 +26,67 @@ namespace tavrin {
 
 struct Assembly;
 struct ZRCustomFeedback;
-class OutputStream;
 class TAVBag;
 
-/// "crowdsourcing" for 0, "Feedbacks" for 1, else the empty text.
-[[nodiscard]] std::string_view convertIdentifierToString(std::int64_t identifier);
+/// What a flusher sends. The numbers are stored with upload tasks.
+enum class FlusherIdentity : std::int64_t {
+    Crowdsourcing, ///< records that clients report for a service of their own
+    Feedbacks,     ///< sessions
+};
+template <> inline constexpr auto kTexts<FlusherIdentity> = texts("crowdsourcing", "Feedbacks");
+
+/// The text of an identity; empty for any other number.
+[[nodiscard]] std::string_view convertIdentifierToString(FlusherIdentity identifier);
 
 /// The names of files that hold an upload's body while it is made begin like this; they are in the temporary directory.
 inline constexpr std::string_view kUploadBodyPrefix = "flusher_";
 
-/// The upload session's note on a task: whose it is, the count that its end is booked with in the statistics, and the
-/// recorded events in it.
+/// What the upload session stores with a task.
 struct UploadNote {
-    std::int64_t flusher = 0;
-    std::int64_t feedbacks = 0;
-    std::uint64_t events = 0;
-    std::string process{}; ///< tells tasks of this process from those of earlier ones
+    FlusherIdentity flusher{};
+    std::int64_t feedbacks = 0; ///< what the statistics count when the task ends
+    std::uint64_t events = 0;   ///< recorded events in the body
+    std::string process{};      ///< the process that made the task: see `FeedbackBooks::process`
 
     [[nodiscard]] platform::Value value() const;
     [[nodiscard]] static UploadNote from(const platform::Value& value);
 };
 
-/// Writes an upload's JSON text, piece by piece. False if it is no JSON object, or the stream is in error.
-bool writeJson(FeedbacksToSend& feedbacks, OutputStream& stream);
-
-/// Turns what has feedback to send into compressed JSON files, and uploads each to the endpoint that the bag names.
+/// Compresses feedback into JSON files and uploads each to the endpoint that the bag names.
 ///
-/// Every object gets one attempt: once it is flushed it is gone, uploaded or not. Without an endpoint nothing is
-/// uploaded. Any thread.
+/// Every object gets one attempt: after a flush it is gone, whether it could be uploaded or not. Without an endpoint
+/// nothing is uploaded. Any thread.
 class TavrinFeedbackFlusher : public std::enable_shared_from_this<TavrinFeedbackFlusher> {
 public:
     using Bodies = std::vector<platform::Bytes>;
 
-    /// `identifier`: 0 sends crowdsourcing records, 1 sessions.
-    static std::shared_ptr<TavrinFeedbackFlusher> make(Assembly& assembly, std::int64_t identifier);
-    TavrinFeedbackFlusher(Assembly& assembly, std::int64_t identifier);
+    /// The endpoint follows the bag from now on.
+    static std::shared_ptr<TavrinFeedbackFlusher> make(Assembly& assembly, FlusherIdentity identifier);
+    TavrinFeedbackFlusher(Assembly& assembly, FlusherIdentity identifier);
     ~TavrinFeedbackFlusher();
 
-    [[nodiscard]] std::int64_t identifier() const { return _identifier; }
+    [[nodiscard]] FlusherIdentity identifier() const { return _identifier; }
 
-    /// Takes an object for the next flush, soon, then calls back.
+    /// Adds an object to the next flush, asynchronously, then calls back.
     void flush(std::shared_ptr<Flushable> object, std::move_only_function<void()> callback);
-    /// The same for a record that is sent on its own; dropped where too many wait.
+    /// Adds a record that is sent on its own. It is dropped if too many wait.
     void flush(std::shared_ptr<ZRCustomFeedback> record, std::move_only_function<void()> callback);
     void flushSyncFromArray(std::vector<std::shared_ptr<Flushable>> objects);
-    /// Forgets what was taken and not flushed.
+    /// Drops what waits for the next flush, asynchronously.
     void dropFeedbacks();
 
-    /// Flushes, soon. With a callback, it gets the compressed bodies.
+    /// Flushes asynchronously. The callback, if there is one, gets the compressed bodies.
     void flushToWireAsync(std::move_only_function<void(Bodies)> callback);
     void flushAllToWire(std::move_only_function<void(Bodies)> callback) { flushToWireAsync(std::move(callback)); }
-    /// Flushes, and answers the compressed bodies. Waits for the queue.
+    /// Flushes and returns the compressed bodies. Blocks on the queue.
     Bodies flushToWireSync();
 
-    // They wait for the queue.
+    // These block on the queue.
     [[nodiscard]] std::size_t countOfDatabuffer();
     [[nodiscard]] std::vector<std::shared_ptr<Flushable>> sessionBuffer();
     [[nodiscard]] std::optional<platform::Url> serverEndpoint();
 
-    /// What the flusher remembers of an upload until it ends. A task of an earlier process is known by its note.
+    /// The count of each running upload. The count of a task of an earlier process comes from its note.
     void setFeedbacksPerTask(const platform::BackgroundTask& task, std::int64_t count);
     void removeFeedbacksForTask(const platform::BackgroundTask& task);
     [[nodiscard]] std::int64_t getFeedbackCountForTask(const platform::BackgroundTask& task);
@@ -99,10 +103,10 @@ private:
     void _saveFile(const std::filesystem::path& fpath, Bodies& bodies);
 
     Assembly& _assembly;
-    const std::int64_t _identifier;
+    const FlusherIdentity _identifier;
     std::shared_ptr<platform::Queue> _queueBuffer; // guards the buffer and the endpoint
     std::vector<std::shared_ptr<Flushable>> _sessionBuffer;
-    std::size_t _recordsBuffered = 0; ///< records in the buffer that go out on their own, and their bytes
+    std::size_t _recordsBuffered = 0; ///< records in the buffer that are sent on their own, and their bytes
     std::size_t _recordBytesBuffered = 0;
     std::optional<platform::Url> _serverEndpoint;
     std::shared_ptr<platform::Queue> _feedbackCountQueue; // guards the counts

@@ -3,6 +3,7 @@
 #include <utility>
 
 #include "platform/device/Device.h"
+#include "platform/run/Group.h"
 #include "platform/run/Queue.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/BackgroundActivitiesManager.h"
@@ -34,13 +35,6 @@ private:
     std::weak_ptr<TavrinFlusherXPC> _bridge;
     std::shared_ptr<TAVFlusherListener> _tool;
 };
-
-/// Runs its function when the last holder lets go: when every flush of a dump has been done, or given up.
-std::shared_ptr<void> whenReleased(std::move_only_function<void()> function)
-{
-    auto shared = std::make_shared<std::move_only_function<void()>>(std::move(function));
-    return {nullptr, [shared](std::nullptr_t) { (*shared)(); }};
-}
 
 } // namespace
 
@@ -103,43 +97,46 @@ void TavrinFlusherXPC::_removeDelegate(const Tool& tool)
 
 void TavrinFlusherXPC::initiateConnectionWithIntent(std::uint64_t intent, std::shared_ptr<TAVFlusherListener> tool)
 {
-    constexpr std::uint64_t kLastIntent = 3;
-    if (intent > kLastIntent) return log().log("Unsupported command yet: {}", intent);
-    _queue->sync([&] {
-        _remoteObject = tool;
-        if (intent == 0) _sendingStreamListener = tool;
-        if (intent == 1) _receivingStreamListener = tool;
-        if (intent == 3 && !_sendingStreamListener) {
-            log().log("no listener for sending stream setting this client as remote");
-            _sendingStreamListener = tool;
-        }
-    });
-    switch (intent) {
-    case 0:
-        return log().log("new listener for flusher client sessions, delegate: {}",
-                         static_cast<const void*>(tool.get()));
-    case 1: return log().log("new listener for client feedbacks, delegate: {}", static_cast<const void*>(tool.get()));
-    case 2:
+    const void* delegate = tool.get();
+    const auto assign = [&](Tool TavrinFlusherXPC::* role) {
+        _queue->sync([&] { _remoteObject = this->*role = tool; });
+    };
+    switch (static_cast<FlusherIntent>(intent)) {
+    case FlusherIntent::WatchFlushes:
+        assign(&TavrinFlusherXPC::_sendingStreamListener);
+        return log().log("new listener for flusher client sessions, delegate: {}", delegate);
+    case FlusherIntent::WatchEvents:
+        assign(&TavrinFlusherXPC::_receivingStreamListener);
+        return log().log("new listener for client feedbacks, delegate: {}", delegate);
+    case FlusherIntent::StopFlushing:
+        assign(&TavrinFlusherXPC::_remoteObject);
         log().log("flushing stopped; dump command will start flushing again");
         _assembly.backgroundFlusher->setStopFlushing(true);
         return tool->workDone();
-    default: return _dump(tool);
+    case FlusherIntent::Dump: assign(&TavrinFlusherXPC::_remoteObject); return _dump(tool);
     }
+    log().log("Unsupported command yet: {}", intent);
 }
 
 void TavrinFlusherXPC::_dump(const Tool& tool)
 {
-    const auto done = whenReleased([flusher = _assembly.backgroundFlusher, tool] {
+    _queue->sync([&] {
+        if (_sendingStreamListener) return;
+        log().log("no listener for sending stream setting this client as remote");
+        _sendingStreamListener = tool;
+    });
+    const auto flusher = _assembly.backgroundFlusher;
+    platform::Group passes;
+    for (const auto& connection : _getClientConnections ? _getClientConnections() : ClientConnections()) {
+        connection->flushSession([flusher, agent = connection->userAgent(), pass = passes.enter()]() mutable {
+            log().log("session flushed because of dump command {}", agent);
+            flusher->insertFlushActivity([pass = std::move(pass)] {});
+        });
+    }
+    passes.notify([flusher, tool] {
         flusher->setStopFlushing(false);
         tool->workDone();
     });
-    if (!_getClientConnections) return;
-    for (const auto& connection : _getClientConnections()) {
-        connection->flushSession([flusher = _assembly.backgroundFlusher, agent = connection->userAgent(), done] {
-            log().log("session flushed because of dump command {}", agent);
-            flusher->insertFlushActivity([done] {});
-        });
-    }
 }
 
 TavrinFlusherXPC::Tool TavrinFlusherXPC::_holderOf(Tool TavrinFlusherXPC::* role) const

@@ -17,11 +17,12 @@ struct Assembly;
 struct TavrinFeedback;
 class ClientConnection;
 
-/// Lets a diagnostic tool watch and steer the feedback pipeline, on an endpoint of its own. Several tools may be
-/// connected: each role belongs to the last one that asked for it. Any thread.
+/// Lets diagnostic tools watch and steer the feedback pipeline, on an endpoint of its own. Each role belongs to the
+/// tool that asked for it last. Any thread.
 class TavrinFlusherXPC : public std::enable_shared_from_this<TavrinFlusherXPC> {
 public:
-    using GetClientConnections = std::function<std::vector<std::shared_ptr<ClientConnection>>()>;
+    using ClientConnections = std::vector<std::shared_ptr<ClientConnection>>;
+    using GetClientConnections = std::function<ClientConnections()>;
 
     static std::shared_ptr<TavrinFlusherXPC> make(Assembly& assembly, GetClientConnections getClientConnections);
     TavrinFlusherXPC(Assembly& assembly, GetClientConnections getClientConnections);
@@ -30,13 +31,12 @@ public:
     /// The listener's address.
     [[nodiscard]] std::string endpoint() const;
 
-    /// A command of `tool`: 0 watch upload bodies, 1 watch events, 2 stop the background uploads, 3 end all sessions,
-    /// upload them and let background uploads go on.
+    /// Handles a command of `tool`, a `FlusherIntent`; any other number is logged and ignored.
     void initiateConnectionWithIntent(std::uint64_t intent, std::shared_ptr<TAVFlusherListener> tool);
 
-    /// One flushed body, to whoever watches bodies.
+    /// Sends a flushed body to the tool that watches bodies, if there is one.
     void sendDataToSendingStreamListener(const platform::Bytes& body);
-    /// One event that was recorded, to whoever watches events. Nothing is made of it if nobody does, nor logs it.
+    /// Sends a recorded event to the tool that watches events, if there is one, and logs it at debug level.
     void sendDataToReceivingStreamListener(const TavrinFeedback& feedback);
 
 private:
@@ -51,7 +51,7 @@ private:
     GetClientConnections _getClientConnections;
     std::unique_ptr<platform::ipc::Listener> _ipcListener;
     const std::shared_ptr<platform::Queue> _queue; // guards all below
-    Tool _remoteObject;                            ///< connected last, or sent the last command
+    Tool _remoteObject;                            ///< the tool that connected or sent a command last
     Tool _sendingStreamListener;
     Tool _receivingStreamListener;
 };

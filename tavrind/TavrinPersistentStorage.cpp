@@ -56,12 +56,19 @@ TavrinPersistentStorage::TavrinPersistentStorage(Assembly& assembly)
                                                               platform::Priority::Background)),
       _cachesUrl(assembly.device.directories.caches / "com.quorvane.tavrind"),
       _store(std::make_shared<FileContainerStore>(
-          assembly.fileManager, assembly.device.transactions, assembly.diagnosticData, assembly.feedbackBooks, _queue,
+          assembly.fileManager, assembly.device.transactions, assembly.diagnosticData, _queue,
           ClientSessionManager::tavrindUserAgent(),
           static_cast<std::uint64_t>(limit(assembly.userDefaults, "TAVSessionSizeLimit", kDefaultMaxFileSize)))),
       _maxFileAge(limit(assembly.userDefaults, "TAVSessionMaxAge", kDefaultMaxFileAge))
 {
     _scanCacheDirectory();
+}
+
+std::shared_ptr<TavrinPersistentStorage> TavrinPersistentStorage::make(Assembly& assembly)
+{
+    auto storage = std::make_shared<TavrinPersistentStorage>(assembly);
+    storage->_settleSoon();
+    return storage;
 }
 
 TavrinPersistentStorage::~TavrinPersistentStorage() = default;
@@ -79,7 +86,6 @@ void TavrinPersistentStorage::_scanCacheDirectory()
     _handleId = largest + 1;
 }
 
-/// Lists a file of an earlier process, or deletes it. Its number, unless the file is gone.
 std::optional<std::int32_t> TavrinPersistentStorage::_adopt(const std::string& name)
 {
     const fs::path fileUrl = _cachesUrl / name;
@@ -89,21 +95,37 @@ std::optional<std::int32_t> TavrinPersistentStorage::_adopt(const std::string& n
         return std::nullopt;
     }
     if (attributes->kind != platform::FileInfo::Kind::File) {
-        log().error("{} is no file, and is left alone", fileUrl.string());
-        return sessionNumber(name); // the name is taken all the same
+        log().error("{} is no regular file and is left alone", fileUrl.string());
+        return sessionNumber(name); // the name is taken nevertheless
     }
-    const std::uint64_t feedbackCount = FileContainer::countFeedback(*_store, fileUrl);
-    if (platform::toSeconds(_assembly.device.clock.wallNow() - attributes->created) > _maxFileAge) {
-        _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.filetooold");
-        _assembly.feedbackBooks.find(FeedbackFate::TooOld, feedbackCount);
-        if (const auto removed = _assembly.fileManager.remove(fileUrl); !removed)
-            log().error("file removing error {}", removed.error().description());
-        return std::nullopt;
-    }
-    _assembly.feedbackBooks.find(FeedbackFate::Closed, feedbackCount);
+    const auto container = std::make_shared<FileContainer>(_store, fileUrl);
+    const bool isTooOld = platform::toSeconds(_assembly.device.clock.wallNow() - attributes->created) > _maxFileAge;
+    _unsettled.push_back({container, isTooOld});
+    if (isTooOld) return std::nullopt;
     ++_fileCount;
-    _fileContainers.push_back(std::make_shared<FileContainer>(_store, fileUrl, feedbackCount));
+    _fileContainers.push_back(container);
     return sessionNumber(name);
+}
+
+void TavrinPersistentStorage::_settle()
+{
+    const auto [container, isTooOld] = _unsettled.front();
+    _unsettled.pop_front();
+    container->countFeedback();
+    _assembly.feedbackBooks.find(isTooOld ? FeedbackFate::TooOld : FeedbackFate::Closed, container->feedbackCount());
+    if (!isTooOld) return;
+    _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.filetooold");
+    if (const auto removed = _assembly.fileManager.remove(container->fileUrl()); !removed)
+        log().error("file removing error {}", removed.error().description());
+}
+
+void TavrinPersistentStorage::_settleSoon()
+{
+    _queue->async([self = shared_from_this()] {
+        if (self->_unsettled.empty()) return;
+        self->_settle();
+        self->_settleSoon(); // as a task of its own: events that clients report are written in between
+    });
 }
 
 std::optional<fs::path> TavrinPersistentStorage::_newFileUrl()
@@ -122,7 +144,7 @@ std::shared_ptr<FileContainer> TavrinPersistentStorage::createFileContainerForWr
         log().error("{} session files wait already: no other one", kMaximumFiles);
         return nullptr;
     }
-    // Names that something else has taken since the scan are passed over.
+    // A name that something else has taken since the scan is skipped.
     for (int attempt = 0; attempt < kMaximumNameAttempts; ++attempt) {
         const auto fileUrl = _newFileUrl();
         if (!fileUrl) break;
@@ -142,6 +164,7 @@ std::shared_ptr<FileContainer> TavrinPersistentStorage::createFileContainerForWr
 std::vector<std::shared_ptr<FileContainer>> TavrinPersistentStorage::getAvailableSessionHandles()
 {
     return _queue->sync([this] {
+        while (!_unsettled.empty()) _settle();
         for (const auto& container : _fileContainers)
             log().debug("available file url {}", container->fileUrl().string());
         return _fileContainers;
@@ -150,10 +173,11 @@ std::vector<std::shared_ptr<FileContainer>> TavrinPersistentStorage::getAvailabl
 
 void TavrinPersistentStorage::closeSessionWithFileContainer(std::shared_ptr<FileContainer> container)
 {
-    container->close();
     _queue->async([self = shared_from_this(), container = std::move(container)]() mutable {
-        self->_fileContainers.push_back(std::move(container));
+        container->closeFile();
+        self->_assembly.feedbackBooks.move(FeedbackFate::Open, FeedbackFate::Closed, container->feedbackCount());
         self->_assembly.feedbackBooks.saveSoon();
+        self->_fileContainers.push_back(std::move(container));
     });
 }
 

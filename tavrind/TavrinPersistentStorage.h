@@ -2,6 +2,7 @@
 
 #include <atomic>
 #include <cstdint>
+#include <deque>
 #include <filesystem>
 #include <memory>
 #include <optional>
@@ -19,44 +20,57 @@ struct Assembly;
 struct FileContainerStore;
 class FileContainer;
 
-/// The number in the name of a session file ("session.17"); none for another name, or a number that leaves no room for
-/// later ones.
+/// Returns the number in the name of a session file ("session.17"); nothing for another name or a number that leaves no
+/// room for later ones.
 [[nodiscard]] std::optional<std::int32_t> sessionNumber(std::string_view fileName);
 
 /// The directory of session files.
 ///
-/// A file is created and open while its session goes on, closed and listed until it is uploaded, then deleted. Files of
-/// an earlier process are listed from the start, those that are too old are deleted. Any thread.
+/// A file is open while its session lasts, then closed and listed until it is uploaded, then deleted. Files of an
+/// earlier process are listed from the start, except those that are too old. Any thread.
 class TavrinPersistentStorage : public std::enable_shared_from_this<TavrinPersistentStorage> {
 public:
-    /// Scans the directory.
+    /// Scans the directory. The events in the files that it finds are counted afterwards, file by file on the queue,
+    /// and files that are too old are deleted there.
+    static std::shared_ptr<TavrinPersistentStorage> make(Assembly& assembly);
     explicit TavrinPersistentStorage(Assembly& assembly);
     ~TavrinPersistentStorage();
 
-    /// A new file, open for one session; null if there can be none.
+    /// Creates a file for one session, open for writing; null if that fails.
     [[nodiscard]] std::shared_ptr<FileContainer> createFileContainerForWriting();
-    /// The closed files, oldest first as far as their numbers tell. They stay in the list.
+    /// Returns the closed files in the order of their numbers. They stay in the list. Blocks on the queue.
     [[nodiscard]] std::vector<std::shared_ptr<FileContainer>> getAvailableSessionHandles();
-    /// Closes a file, soon, and lists it.
+    /// Closes a file and lists it, asynchronously.
     void closeSessionWithFileContainer(std::shared_ptr<FileContainer> container);
-    /// Deletes a file, soon, and lists it no longer.
+    /// Deletes a file and removes it from the list, asynchronously.
     void deleteSessionWithFileContainer(std::shared_ptr<FileContainer> container);
 
     [[nodiscard]] const FileContainerStore& store() const { return *_store; }
 
 private:
     void _scanCacheDirectory();
+    /// Lists a file of an earlier process unless it is too old. Returns its number if the file stays.
     [[nodiscard]] std::optional<std::int32_t> _adopt(const std::string& name);
+    /// Books the events of the next file of an earlier process, and deletes it if it is too old. On the queue.
+    void _settle();
+    /// Settles all files, one task each.
+    void _settleSoon();
     [[nodiscard]] std::optional<std::filesystem::path> _newFileUrl();
 
     Assembly& _assembly;
     std::shared_ptr<platform::Queue> _queue;
     std::filesystem::path _cachesUrl;
     std::shared_ptr<const FileContainerStore> _store;
-    double _maxFileAge = 0; ///< seconds
+    struct Found {
+        std::shared_ptr<FileContainer> container;
+        bool isTooOld;
+    };
+
+    double _maxFileAge = 0; ///< in seconds
     std::atomic<std::int32_t> _handleId = 0;
     std::atomic<int> _fileCount = 0;                             ///< session files, open and listed
     std::vector<std::shared_ptr<FileContainer>> _fileContainers; // on _queue
+    std::deque<Found> _unsettled;                                // on _queue
 };
 
 } // namespace tavrin

@@ -24,7 +24,7 @@ public:
     explicit RecordingSessionManager(Assembly& assembly)
         : ClientSessionManager(assembly, assembly.guidController, "test")
     {}
-    void addTavrinFeedback(std::shared_ptr<TavrinFeedback> feedback) override
+    void addTavrinFeedback(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void>) override
     {
         records.push_back(std::move(feedback));
     }
