@@ -20,210 +20,241 @@ const std::vector<std::string_view> kTAVResourceIdentifiers{
 
 namespace {
 
-enum class Kind { Text, Switch, Count, Seconds, UrlText, Template, Texts, Clients };
+// What a key's value may be: each type reads one, or nothing for a value of another type.
 
-struct Key {
-    std::string_view name;
-    Kind kind;
+struct Text {
+    static constexpr std::string_view kExpected = "a string or a number";
+    static std::optional<std::string> read(const Value& value)
+    {
+        if (const std::string* text = value.asString()) return *text;
+        return value.isNumber() ? std::optional(platform::toJson(value)) : std::nullopt;
+    }
 };
 
-const std::vector<Key>& knownKeys()
-{
-    static const std::vector<Key> keys = [] {
-        std::vector<Key> all{{"version", Kind::Text},
-                             {"isEnabled", Kind::Switch},
-                             {"feedbackEnabled", Kind::Switch},
-                             {"minimumQueryLength", Kind::Count},
-                             {"timeoutIntervalForRequest", Kind::Seconds},
-                             {"searchURL", Kind::UrlText},
-                             {"warmURL", Kind::UrlText},
-                             {"flightURL", Kind::UrlText},
-                             {"feedbackURL", Kind::UrlText},
-                             {"crowdsourcingURL", Kind::UrlText},
-                             {"imageURL", Kind::Template},
-                             {"sendGeoEnvironmentHeader", Kind::Switch},
-                             {"supportedGeoLocationSources", Kind::Texts},
-                             {"hashtagImagesVisible", Kind::Switch},
-                             {"subscriptionProviderDomainWhitelist", Kind::Texts},
-                             {"subscriptionProviderBundleIdentifierWhitelist", Kind::Texts},
-                             {"subscriptionTTL", Kind::Seconds},
-                             {"clients", Kind::Clients}};
-        for (std::string_view resource : kTAVResourceIdentifiers) all.push_back({resource, Kind::UrlText});
-        return all;
-    }();
-    return keys;
-}
+struct Switch {
+    static constexpr std::string_view kExpected = "true or false";
+    static std::optional<bool> read(const Value& value) { return value.asBool(); }
+};
 
-std::optional<double> secondsIn(const Value& value)
-{
-    const auto seconds = value.asDouble();
-    return seconds && std::isfinite(*seconds) && *seconds > 0 ? seconds : std::nullopt;
-}
+struct Count {
+    static constexpr std::string_view kExpected = "a whole number of 0 or more";
+    static std::optional<std::uint64_t> read(const Value& value) { return value.asUInt(); }
+};
 
-std::optional<Url> httpUrlIn(const Value& value)
-{
-    const std::string* text = value.asString();
-    auto url = text ? Url::parse(*text) : std::nullopt;
-    if (!url || url->host().empty()) return std::nullopt;
-    const std::string scheme = url->scheme();
-    return scheme == "http" || scheme == "https" ? url : std::nullopt;
-}
-
-std::optional<std::vector<std::string>> stringsIn(const Value& value)
-{
-    const Value::Array* array = value.asArray();
-    if (!array) return std::nullopt;
-    std::vector<std::string> result;
-    for (const Value& element : *array)
-        if (const std::string* text = element.asString()) result.push_back(*text);
-    return result;
-}
-
-const char* expectation(Kind kind, const Value& value)
-{
-    switch (kind) {
-    case Kind::Text: return value.asString() || value.isNumber() ? nullptr : "a string or a number";
-    case Kind::Switch: return value.asBool() ? nullptr : "true or false";
-    case Kind::Count: return value.asUInt() ? nullptr : "a whole number of 0 or more";
-    case Kind::Seconds: return secondsIn(value) ? nullptr : "a number of seconds above 0";
-    case Kind::UrlText: return httpUrlIn(value) ? nullptr : "an http or https URL";
-    case Kind::Template: return value.asString() ? nullptr : "a URL with {id} in it";
-    case Kind::Texts: return stringsIn(value) ? nullptr : "an array of strings";
-    case Kind::Clients: return value.asDictionary() ? nullptr : "a dictionary by client name";
+struct Seconds {
+    static constexpr std::string_view kExpected = "a number of seconds above 0";
+    static std::optional<double> read(const Value& value)
+    {
+        const auto seconds = value.asDouble();
+        return seconds && std::isfinite(*seconds) && *seconds > 0 ? seconds : std::nullopt;
     }
-    return nullptr;
-}
+};
+
+struct HttpUrl {
+    static constexpr std::string_view kExpected = "an http or https URL";
+    static std::optional<Url> read(const Value& value)
+    {
+        const std::string* text = value.asString();
+        auto url = text ? Url::parse(*text) : std::nullopt;
+        if (!url || url->host().empty()) return std::nullopt;
+        const std::string scheme = url->scheme();
+        return scheme == "http" || scheme == "https" ? url : std::nullopt;
+    }
+};
+
+struct UrlTemplate {
+    static constexpr std::string_view kExpected = "a URL with {id} in it";
+    static std::optional<std::string> read(const Value& value)
+    {
+        const std::string* text = value.asString();
+        return text ? std::optional(*text) : std::nullopt;
+    }
+};
+
+struct Texts {
+    static constexpr std::string_view kExpected = "an array of strings";
+    static std::optional<std::vector<std::string>> read(const Value& value)
+    {
+        const Value::Array* array = value.asArray();
+        if (!array) return std::nullopt;
+        std::vector<std::string> result;
+        for (const Value& element : *array)
+            if (const std::string* text = element.asString()) result.push_back(*text);
+        return result;
+    }
+};
+
+struct ViewsByClient {
+    static constexpr std::string_view kExpected = "a dictionary by client name";
+    static std::optional<Value> read(const Value& value)
+    {
+        return value.asDictionary() ? std::optional(value) : std::nullopt;
+    }
+};
+
+/// A key that `Type` reads.
+template <class T> struct Key {
+    using Type = T;
+    std::string_view name;
+    [[nodiscard]] constexpr TAVBag::KnownKey known() const
+    {
+        return {name, Type::kExpected, [](const Value& value) { return Type::read(value).has_value(); }};
+    }
+};
+
+constexpr Key<Text> kVersion{"version"};
+constexpr Key<Switch> kIsEnabled{"isEnabled"};
+constexpr Key<Switch> kFeedbackEnabled{"feedbackEnabled"};
+constexpr Key<Count> kMinimumQueryLength{"minimumQueryLength"};
+constexpr Key<Seconds> kTimeoutIntervalForRequest{"timeoutIntervalForRequest"};
+constexpr Key<HttpUrl> kSearchURL{"searchURL"};
+constexpr Key<HttpUrl> kWarmURL{"warmURL"};
+constexpr Key<HttpUrl> kFlightURL{"flightURL"};
+constexpr Key<HttpUrl> kFeedbackURL{"feedbackURL"};
+constexpr Key<HttpUrl> kCrowdsourcingURL{"crowdsourcingURL"};
+constexpr Key<UrlTemplate> kImageURL{"imageURL"};
+constexpr Key<Switch> kSendGeoEnvironmentHeader{"sendGeoEnvironmentHeader"};
+constexpr Key<Texts> kSupportedGeoLocationSources{"supportedGeoLocationSources"};
+constexpr Key<Switch> kHashtagImagesVisible{"hashtagImagesVisible"};
+constexpr Key<Texts> kSubscriptionDomains{"subscriptionProviderDomainWhitelist"};
+constexpr Key<Texts> kSubscriptionBundleIdentifiers{"subscriptionProviderBundleIdentifierWhitelist"};
+constexpr Key<Seconds> kSubscriptionTTL{"subscriptionTTL"};
+constexpr Key<ViewsByClient> kClients{"clients"};
 
 void findProblems(const Value& view, const std::string& where, std::vector<std::string>& problems)
 {
-    for (const Key& key : knownKeys()) {
+    for (const TAVBag::KnownKey& key : TAVBag::knownKeys()) {
         const Value& value = view[key.name];
-        if (value.isNull()) continue;
-        if (const char* expected = expectation(key.kind, value))
-            problems.push_back(fmt::format("{}{}: expected {}", where, key.name, expected));
+        if (!value.isNull() && !key.accepts(value))
+            problems.push_back(fmt::format("{}{}: expected {}", where, key.name, key.expected));
     }
 }
 
 } // namespace
 
+const std::vector<TAVBag::KnownKey>& TAVBag::knownKeys()
+{
+    static const std::vector<KnownKey> all = [] {
+        std::vector<KnownKey> keys{kVersion.known(),
+                                   kIsEnabled.known(),
+                                   kFeedbackEnabled.known(),
+                                   kMinimumQueryLength.known(),
+                                   kTimeoutIntervalForRequest.known(),
+                                   kSearchURL.known(),
+                                   kWarmURL.known(),
+                                   kFlightURL.known(),
+                                   kFeedbackURL.known(),
+                                   kCrowdsourcingURL.known(),
+                                   kImageURL.known(),
+                                   kSendGeoEnvironmentHeader.known(),
+                                   kSupportedGeoLocationSources.known(),
+                                   kHashtagImagesVisible.known(),
+                                   kSubscriptionDomains.known(),
+                                   kSubscriptionBundleIdentifiers.known(),
+                                   kSubscriptionTTL.known(),
+                                   kClients.known()};
+        for (std::string_view resource : kTAVResourceIdentifiers) keys.push_back(Key<HttpUrl>{resource}.known());
+        return keys;
+    }();
+    return all;
+}
+
 TAVBag::TAVBag(Value rawBag, std::string userAgent) : _rawBag(std::move(rawBag)), _userAgent(std::move(userAgent))
 {
     if (!_rawBag.asDictionary()) _rawBag = platform::Dictionary();
-    if (const auto name = extractClientNameFromString(_userAgent)) _clientView = _rawBag["clients"][*name];
+    if (const auto name = extractClientNameFromString(_userAgent)) _clientView = _rawBag[kClients.name][*name];
 }
 
-const Value& TAVBag::get(std::string_view key) const
+template <class Key> auto TAVBag::read(const Key& key) const
 {
-    const Value& overriding = _clientView[key];
-    return overriding.isNull() ? _rawBag[key] : overriding;
-}
-
-std::optional<Url> TAVBag::url(std::string_view key) const
-{
-    return httpUrlIn(get(key));
-}
-
-bool TAVBag::boolean(std::string_view key, bool fallback) const
-{
-    return get(key).asBool().value_or(fallback);
-}
-
-std::optional<std::vector<std::string>> TAVBag::strings(std::string_view key) const
-{
-    return stringsIn(get(key));
+    const Value& overriding = _clientView[key.name];
+    return Key::Type::read(overriding.isNull() ? _rawBag[key.name] : overriding);
 }
 
 std::string TAVBag::version() const
 {
-    const Value& value = get("version");
-    if (const std::string* text = value.asString()) return *text;
-    return value.isNumber() ? platform::toJson(value) : std::string();
+    return read(kVersion).value_or("");
 }
-
 bool TAVBag::isEnabled() const
 {
-    return boolean("isEnabled", true);
+    return read(kIsEnabled).value_or(true);
 }
 bool TAVBag::feedbackEnabled() const
 {
-    return boolean("feedbackEnabled", true);
+    return read(kFeedbackEnabled).value_or(true);
 }
 std::uint64_t TAVBag::minimumQueryLength() const
 {
-    return get("minimumQueryLength").asUInt().value_or(1);
+    return read(kMinimumQueryLength).value_or(1);
 }
 std::optional<double> TAVBag::timeoutIntervalForRequest() const
 {
-    return secondsIn(get("timeoutIntervalForRequest"));
+    return read(kTimeoutIntervalForRequest);
 }
 std::optional<Url> TAVBag::searchURL() const
 {
-    return url("searchURL");
+    return read(kSearchURL);
 }
 std::optional<Url> TAVBag::warmURL() const
 {
-    return url("warmURL");
+    return read(kWarmURL);
 }
 std::optional<Url> TAVBag::flightURL() const
 {
-    return url("flightURL");
+    return read(kFlightURL);
 }
 std::optional<Url> TAVBag::feedbackURL() const
 {
-    return url("feedbackURL");
+    return read(kFeedbackURL);
 }
 std::optional<Url> TAVBag::crowdsourcingURL() const
 {
-    return url("crowdsourcingURL");
+    return read(kCrowdsourcingURL);
 }
 std::optional<Url> TAVBag::resourceURL(std::string_view identifier) const
 {
-    return url(identifier);
+    return read(Key<HttpUrl>{identifier});
 }
 bool TAVBag::sendGeoEnvironmentHeader() const
 {
-    return boolean("sendGeoEnvironmentHeader", false);
+    return read(kSendGeoEnvironmentHeader).value_or(false);
 }
 std::optional<bool> TAVBag::hashtagImagesVisible() const
 {
-    return get("hashtagImagesVisible").asBool();
+    return read(kHashtagImagesVisible);
 }
 double TAVBag::subscriptionTTL() const
 {
-    return secondsIn(get("subscriptionTTL")).value_or(86400);
+    return read(kSubscriptionTTL).value_or(86400);
 }
-
 std::vector<std::string> TAVBag::supportedGeoLocationSources() const
 {
-    return strings("supportedGeoLocationSources").value_or(std::vector<std::string>());
+    return read(kSupportedGeoLocationSources).value_or(std::vector<std::string>());
 }
-
 std::optional<std::vector<std::string>> TAVBag::subscriptionProviderDomainWhitelist() const
 {
-    return strings("subscriptionProviderDomainWhitelist");
+    return read(kSubscriptionDomains);
 }
-
 std::optional<std::vector<std::string>> TAVBag::subscriptionProviderBundleIdentifierWhitelist() const
 {
-    return strings("subscriptionProviderBundleIdentifierWhitelist");
+    return read(kSubscriptionBundleIdentifiers);
 }
 
 std::optional<Url> TAVBag::urlForIdentifier(std::string_view identifier) const
 {
     static constexpr std::string_view kPlaceholder = "{id}";
-    const std::string* pattern = get("imageURL").asString();
-    const std::size_t at = pattern ? pattern->find(kPlaceholder) : std::string::npos;
+    auto text = read(kImageURL);
+    const std::size_t at = text ? text->find(kPlaceholder) : std::string::npos;
     if (at == std::string::npos) return std::nullopt;
-    std::string text = *pattern;
-    text.replace(at, kPlaceholder.size(), platform::percentEncodePathSegment(identifier));
-    return httpUrlIn(Value(std::move(text)));
+    text->replace(at, kPlaceholder.size(), platform::percentEncodePathSegment(identifier));
+    return HttpUrl::read(Value(std::move(*text)));
 }
 
 std::vector<std::string> TAVBag::problems() const
 {
     std::vector<std::string> problems;
     findProblems(_rawBag, "", problems);
-    if (const platform::Dictionary* clients = _rawBag["clients"].asDictionary()) {
+    if (const platform::Dictionary* clients = _rawBag[kClients.name].asDictionary()) {
         for (const auto& [name, view] : *clients) {
             if (view.asDictionary())
                 findProblems(view, fmt::format("clients.{}.", name), problems);

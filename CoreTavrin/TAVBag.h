@@ -53,14 +53,20 @@ public:
     [[nodiscard]] std::optional<std::vector<std::string>> subscriptionProviderBundleIdentifierWhitelist() const;
     [[nodiscard]] double subscriptionTTL() const; ///< seconds; 86400
 
-    /// One text for each key, in either view, whose value has the wrong type and is not looked at.
+    /// One text for each key, at the top level or in a client's view, whose value has the wrong type.
     [[nodiscard]] std::vector<std::string> problems() const;
 
+    /// A key that is read, in words for people: "expected true or false".
+    struct KnownKey {
+        std::string_view name;
+        std::string_view expected;
+        bool (*accepts)(const platform::Value&);
+    };
+    /// All of them; those of the downloadable resources come last.
+    [[nodiscard]] static const std::vector<KnownKey>& knownKeys();
+
 private:
-    [[nodiscard]] const platform::Value& get(std::string_view key) const;
-    [[nodiscard]] std::optional<platform::Url> url(std::string_view key) const;
-    [[nodiscard]] bool boolean(std::string_view key, bool fallback) const;
-    [[nodiscard]] std::optional<std::vector<std::string>> strings(std::string_view key) const;
+    template <class Key> [[nodiscard]] auto read(const Key& key) const;
 
     platform::Value _rawBag;
     platform::Value _clientView; // the overriding keys, or null

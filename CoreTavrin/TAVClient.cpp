@@ -5,16 +5,14 @@
 
 #include <fmt/format.h>
 
-#include "CoreTavrin/TAVBag.h"
+#include "CoreTavrin/TAVMembers.h"
 #include "CoreTavrin/TAVProtocols.h"
-#include "CoreTavrin/TAVRecordClasses.h"
 #include "CoreTavrin/TAVReply.h"
 #include "CoreTavrin/TAVRequest.h"
 #include "CoreTavrin/TAVSessionConfiguration.h"
 #include "platform/files/Files.h"
 #include "platform/ipc/BusClient.h"
 #include "platform/values/Dictionary.h"
-#include "platform/values/ValueCoder.h"
 #include "searchrecords/ZRFeedback.h"
 
 namespace tavrin {
@@ -32,54 +30,25 @@ platform::Error clientError(std::int64_t code, std::string reason)
     return platform::Error::withReason(std::string(TAVClientErrorDomain), code, std::move(reason));
 }
 
-/// The record in an answer, or none for the empty dictionary.
-template <class T> Result<std::shared_ptr<T>> recordIn(const Value& value)
+/// What a row reads in a message, or the message's error.
+template <class Row> auto resultsOf(const Row& row, Result<ipc::Message> answer) -> Result<typename Row::Results>
 {
-    if (value.count() == 0) return nullptr;
-    return platform::castRecord<T>(platform::recordFromValue(value, coreRecordClasses()));
+    if (!answer) return std::unexpected(std::move(answer.error()));
+    return row.results(std::move(*answer));
 }
 
-Result<TAVAnswer> answerIn(const Result<ipc::Message>& result)
+/// The one result of a row that has one.
+template <class T> Result<T> only(Result<std::tuple<T>> results)
 {
-    if (!result) return std::unexpected(result.error());
-    const ipc::Message& message = *result;
-    auto reply = recordIn<TAVReply>(message.args[1]);
-    if (!reply) return std::unexpected(std::move(reply.error()));
-    return TAVAnswer{message.args[0].asInt().value_or(0), std::move(*reply), errorFromValue(message.args[2])};
+    if (!results) return std::unexpected(std::move(results.error()));
+    return std::get<0>(std::move(*results));
 }
 
-Result<TAVBagAnswer> bagIn(const Result<ipc::Message>& result)
+/// All results of a row as a structure of the same members.
+template <class Structure, class... T> Result<Structure> as(Result<std::tuple<T...>> results)
 {
-    if (!result) return std::unexpected(result.error());
-    const ipc::Message& message = *result;
-    auto record = recordIn<TAVBagRecord>(message.args[0]);
-    if (!record) return std::unexpected(std::move(record.error()));
-    return TAVBagAnswer{*record ? (*record)->bag() : nullptr, errorFromValue(message.args[1])};
-}
-
-/// What `decode` makes of a message, or the message's error.
-template <class Decode>
-auto decoded(const Result<ipc::Message>& message, Decode decode) -> Result<std::decay_t<decltype(decode(*message))>>
-{
-    if (!message) return std::unexpected(message.error());
-    return decode(*message);
-}
-
-std::string textIn(const Value& value)
-{
-    const std::string* text = value.asString();
-    return text ? *text : std::string();
-}
-
-std::string firstText(const ipc::Message& message)
-{
-    return textIn(message.args[0]);
-}
-
-Value::Array arrayIn(const Value& value)
-{
-    const Value::Array* array = value.asArray();
-    return array ? *array : Value::Array();
+    if (!results) return std::unexpected(std::move(results.error()));
+    return std::apply([](auto&&... each) { return Structure{std::move(each)...}; }, std::move(*results));
 }
 
 } // namespace
@@ -99,41 +68,27 @@ bool TAVConnection::connected() const
     return _client->connected();
 }
 
-void TAVConnection::send(std::string_view member, std::vector<Value> arguments,
-                         std::function<void(Result<ipc::Message>)> handler)
+void TAVConnection::sendCall(const ipc::Member& member, ipc::Message message, MessageHandler handler)
 {
-    const auto declared = std::ranges::find(_interface.methods, member, &ipc::Member::name);
-    _client->call(_interface.name, *declared, {std::move(arguments), {}},
-                  [handler = std::move(handler)](ipc::CallResult result) {
-                      if (result) return handler(std::move(*result));
-                      handler(std::unexpected(
-                          clientError(EPROTO, fmt::format("{} ({})", result.error().message, result.error().name))));
-                  });
+    _client->call(_interface.name, member, std::move(message), [handler = std::move(handler)](ipc::CallResult result) {
+        if (result) return handler(std::move(*result));
+        handler(
+            std::unexpected(clientError(EPROTO, fmt::format("{} ({})", result.error().message, result.error().name))));
+    });
 }
 
-Result<ipc::Message> TAVConnection::call(std::string_view member, std::vector<Value> arguments, platform::Duration more)
+Result<ipc::Message> TAVConnection::call(const ipc::Member& member, ipc::Message message, platform::Duration more)
 {
     const platform::Duration timeout = _timeout + more;
-    // Shared with the handler, which outlives this call where the time is up first.
+    // Shared with the handler, which outlives this call if the time is up first.
     auto answer = std::make_shared<std::optional<Result<ipc::Message>>>();
-    send(member, std::move(arguments), [answer](Result<ipc::Message> result) { *answer = std::move(result); });
+    sendCall(member, std::move(message), [answer](Result<ipc::Message> result) { *answer = std::move(result); });
     if (wait([&] { return answer->has_value(); }, timeout)) return std::move(**answer);
     if (!connected())
         return std::unexpected(
-            clientError(ECONNRESET, fmt::format("the daemon closed the connection during {}", member)));
-    return std::unexpected(
-        clientError(ETIMEDOUT, fmt::format("no answer to {} within {:g} s", member, platform::toSeconds(timeout))));
-}
-
-void TAVConnection::sendRequest(std::vector<Value> arguments, AnswerHandler handler)
-{
-    send("Request", std::move(arguments),
-         [handler = std::move(handler)](const Result<ipc::Message>& message) { handler(answerIn(message)); });
-}
-
-Result<TAVAnswer> TAVConnection::answerTo(std::vector<Value> arguments)
-{
-    return answerIn(call("Request", std::move(arguments)));
+            clientError(ECONNRESET, fmt::format("the daemon closed the connection during {}", member.name)));
+    return std::unexpected(clientError(
+        ETIMEDOUT, fmt::format("no answer to {} within {:g} s", member.name, platform::toSeconds(timeout))));
 }
 
 Result<std::unique_ptr<TAVEndpointClient>> TAVEndpointClient::connect(const std::string& endpoint)
@@ -145,17 +100,20 @@ Result<std::unique_ptr<TAVEndpointClient>> TAVEndpointClient::connect(const std:
 
 Result<TAVAnswer> TAVEndpointClient::request(const TAVRequest& request, const TAVSessionConfiguration& configuration)
 {
-    return answerTo({platform::toValue(request), platform::toValue(configuration)});
+    constexpr auto& row = members::kEndpointRequest;
+    return as<TAVAnswer>(resultsOf(row, call(row, row.call(request, configuration))));
 }
 
 Result<std::map<std::string, platform::Bytes>> TAVEndpointClient::loadImages(const Value::Array& images,
                                                                              platform::Duration limit)
 {
+    constexpr auto& row = members::kLoadImages;
     limit = std::clamp<platform::Duration>(limit, platform::Duration::zero(), std::chrono::minutes(1));
-    const auto message = call("LoadImages", {images, static_cast<std::uint64_t>(limit.count())}, limit);
-    if (!message) return std::unexpected(message.error());
+    const auto nanoseconds = static_cast<std::uint64_t>(limit.count());
+    const auto answer = only(resultsOf(row, call(row, row.call(images, nanoseconds), limit)));
+    if (!answer) return std::unexpected(answer.error());
     std::map<std::string, platform::Bytes> loaded;
-    if (const platform::Dictionary* entries = message->args[0].asDictionary())
+    if (const platform::Dictionary* entries = answer->asDictionary())
         for (const auto& [name, image] : *entries)
             if (image.asBytes()) loaded.emplace(name, *image.asBytes());
     return loaded;
@@ -166,21 +124,24 @@ Result<std::unique_ptr<TAVFlusherClient>> TAVFlusherClient::connect(const std::s
 {
     auto client = open(endpoint);
     if (!client) return std::unexpected(std::move(client.error()));
-    (*client)->onSignal([&listener](std::string_view, std::string_view member, const ipc::Message& message) {
-        const Value& argument = message.args.empty() ? Value() : message.args.front();
-        if (member == "FlushedData" && argument.asBytes())
-            listener.flushedData(*argument.asBytes());
-        else if (member == "ReceivedFeedbackDescription" && argument.asString())
-            listener.receivedFeedbackDescription(*argument.asString());
-        else if (member == "WorkDone")
+    (*client)->onSignal([&listener](std::string_view, std::string_view member, ipc::Message message) {
+        if (member == members::kFlushedData.name) {
+            if (const auto body = members::kFlushedData.arguments(std::move(message)))
+                listener.flushedData(std::get<0>(*body));
+        } else if (member == members::kReceivedFeedbackDescription.name) {
+            if (const auto text = members::kReceivedFeedbackDescription.arguments(std::move(message)))
+                listener.receivedFeedbackDescription(std::get<0>(*text));
+        } else if (member == members::kWorkDone.name) {
             listener.workDone();
+        }
     });
     return std::unique_ptr<TAVFlusherClient>(new TAVFlusherClient(std::move(*client), flusherInterface()));
 }
 
 Result<void> TAVFlusherClient::initiateConnection(FlusherIntent intent)
 {
-    const auto answer = call("InitiateConnectionWithIntent", {static_cast<std::uint64_t>(intent)});
+    constexpr auto& row = members::kInitiateConnectionWithIntent;
+    const auto answer = call(row, row.call(static_cast<std::uint64_t>(intent)));
     if (!answer) return std::unexpected(answer.error());
     return {};
 }
@@ -199,75 +160,78 @@ Result<std::unique_ptr<TAVClient>> TAVClient::connect(const std::string& address
 
 Result<std::string> TAVClient::configure(const TAVSessionConfiguration& configuration)
 {
-    return decoded(call("Configure", {platform::toValue(configuration)}), firstText);
+    return only(resultsOf(members::kConfigure, call(members::kConfigure, members::kConfigure.call(configuration))));
 }
 
 Result<TAVBagAnswer> TAVClient::bag()
 {
-    return bagIn(call("Bag"));
+    return as<TAVBagAnswer>(resultsOf(members::kBag, call(members::kBag, {})));
 }
 
 Result<TAVAnswer> TAVClient::request(const TAVRequest& request)
 {
-    return answerTo({platform::toValue(request)});
+    constexpr auto& row = members::kRequest;
+    return as<TAVAnswer>(resultsOf(row, call(row, row.call(request))));
 }
 
 void TAVClient::send(const TAVRequest& request, AnswerHandler handler)
 {
-    sendRequest({platform::toValue(request)}, std::move(handler));
+    constexpr auto& row = members::kRequest;
+    sendCall(row, row.call(request), [handler = std::move(handler)](Result<ipc::Message> answer) {
+        handler(as<TAVAnswer>(resultsOf(row, std::move(answer))));
+    });
 }
 
 void TAVClient::reportEvent(const std::string& event, std::int64_t queryId, const ZRFeedback& feedback,
                             std::function<void(Result<void>)> taken)
 {
-    TAVConnection::send("ReportEvent", {event, queryId, platform::toValue(feedback)},
-                        [taken = std::move(taken)](const Result<ipc::Message>& message) {
-                            if (taken) taken(message ? Result<void>() : std::unexpected(message.error()));
-                        });
+    constexpr auto& row = members::kReportEvent;
+    sendCall(row, row.call(event, queryId, feedback), [taken = std::move(taken)](const Result<ipc::Message>& answer) {
+        if (taken) taken(answer ? Result<void>() : std::unexpected(answer.error()));
+    });
 }
 
 Result<Value::Array> TAVClient::feedback()
 {
-    auto message = call("Feedback", {""});
-    if (!message) return std::unexpected(std::move(message.error()));
-    if (auto error = errorFromValue(message->args[1])) return std::unexpected(std::move(*error));
-    return arrayIn(message->args[0]);
+    auto results = resultsOf(members::kFeedback, call(members::kFeedback, members::kFeedback.call("")));
+    if (!results) return std::unexpected(std::move(results.error()));
+    auto& [feedbacks, error] = *results;
+    if (error) return std::unexpected(std::move(*error));
+    return std::move(feedbacks);
 }
 
 Result<std::string> TAVClient::listenToFlusher()
 {
-    return decoded(call("ListenToFlusher"), firstText);
+    return only(resultsOf(members::kListenToFlusher, call(members::kListenToFlusher, {})));
 }
 
 Result<Value::Array> TAVClient::sessions()
 {
-    return decoded(call("ListSessions"), [](const ipc::Message& message) { return arrayIn(message.args[0]); });
+    return only(resultsOf(members::kListSessions, call(members::kListSessions, {})));
 }
 
 Result<TAVResourceAnswer> TAVClient::resource(const std::string& identifier)
 {
-    auto message = call("FileHandleAndAttributesForResource", {identifier});
-    if (!message) return std::unexpected(std::move(message.error()));
-    TAVResourceAnswer answer{{}, message->args[1], errorFromValue(message->args[2])};
-    if (!message->handles.empty()) answer.file = std::move(message->handles.front());
-    return answer;
+    constexpr auto& row = members::kResource;
+    return as<TAVResourceAnswer>(resultsOf(row, call(row, row.call(identifier))));
 }
 
 Result<Value> TAVClient::status()
 {
-    return decoded(call("Status"), [](const ipc::Message& message) { return message.args[0]; });
+    return only(resultsOf(members::kStatus, call(members::kStatus, {})));
 }
 
 Result<std::string> TAVClient::statistics()
 {
-    return decoded(call("Statistics"), firstText);
+    return only(resultsOf(members::kStatistics, call(members::kStatistics, {})));
 }
 
 void TAVClient::onBagDidLoad(std::function<void(TAVBagAnswer)> handler)
 {
     _client->onSignal([handler = std::move(handler)](std::string_view, std::string_view member, ipc::Message message) {
-        if (member != "BagDidLoad" || message.args.size() != 2) return;
-        if (auto bag = bagIn(std::move(message))) handler(std::move(*bag));
+        if (member != members::kBagDidLoad.name) return;
+        if (auto pushed = as<TAVBagAnswer>(members::kBagDidLoad.arguments(std::move(message))))
+            handler(std::move(*pushed));
     });
 }
 

@@ -67,16 +67,12 @@ protected:
     TAVConnection(std::unique_ptr<platform::ipc::Client> client, const platform::ipc::Interface& interface)
         : _client(std::move(client)), _interface(interface)
     {}
-    /// Sends a call; `handler` gets its arguments, or the error in `TAVClientErrorDomain`.
-    void send(std::string_view member, std::vector<platform::Value> arguments,
-              std::function<void(platform::Result<platform::ipc::Message>)> handler);
+    using MessageHandler = std::function<void(platform::Result<platform::ipc::Message>)>;
+    /// Sends a call of `member`; `handler` gets its answer, or an error in `TAVClientErrorDomain`, inside a later wait.
+    void sendCall(const platform::ipc::Member& member, platform::ipc::Message message, MessageHandler handler);
     /// Sends a call and waits for its answer, which may take the daemon `more` than others do.
-    platform::Result<platform::ipc::Message> call(std::string_view member, std::vector<platform::Value> arguments = {},
+    platform::Result<platform::ipc::Message> call(const platform::ipc::Member& member, platform::ipc::Message message,
                                                   platform::Duration more = {});
-    /// Sends a request whose answer is (query id, reply, error).
-    void sendRequest(std::vector<platform::Value> arguments, AnswerHandler handler);
-    /// Sends such a request and waits for its answer.
-    platform::Result<TAVAnswer> answerTo(std::vector<platform::Value> arguments);
 
     std::unique_ptr<platform::ipc::Client> _client;
     const platform::ipc::Interface& _interface;

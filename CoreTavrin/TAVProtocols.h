@@ -10,8 +10,8 @@
 #include "platform/run/Reply.h"
 #include "platform/values/Value.h"
 
-/// The protocols that clients and the daemon speak, as types on the one side and as D-Bus interfaces on the other, and
-/// the thin adaptors between the two. docs/ipc.md describes the wire.
+/// The protocols that clients and the daemon speak: abstract types, and the adaptors that serve them as D-Bus
+/// interfaces by the rows of TAVMembers.h. docs/ipc.md describes the wire.
 namespace tavrin {
 
 struct TAVReply;
@@ -102,28 +102,25 @@ public:
     virtual void workDone() = 0;
 };
 
-/// The interfaces of the three kinds of connection.
 /// The path of every object that the daemon exports.
 inline constexpr std::string_view kObjectPath = "/com/quorvane/tavrind";
 
+/// The interfaces of the three kinds of connection.
 [[nodiscard]] const platform::ipc::Interface& daemonInterface();
 [[nodiscard]] const platform::ipc::Interface& endpointInterface();
 [[nodiscard]] const platform::ipc::Interface& flusherInterface();
 
-/// Handlers that decode a call, make it on the object and encode its answer. A call to an object that is gone is not
-/// answered.
+/// Handlers that decode a call, make it on the object and encode its answer. They hold the object weakly: a call to one
+/// that is gone is not answered.
 [[nodiscard]] platform::ipc::Handler daemonHandler(std::weak_ptr<TAVDaemonXPC> object,
                                                    std::weak_ptr<TAVDiagnosticsXPC> diagnostics);
 [[nodiscard]] platform::ipc::Handler endpointHandler(std::weak_ptr<TAVEndpointXPC> object);
 [[nodiscard]] platform::ipc::Handler flusherHandler(std::weak_ptr<TAVFlusherXPC> object);
 
-/// The peer's side of a connection, which the proxy doesn't keep alive.
+/// The peer's side of a connection, as signals. The proxy holds the connection weakly; once that is gone, what it is
+/// told goes nowhere.
 [[nodiscard]] std::shared_ptr<TAVClientXPC> makeClientProxy(std::weak_ptr<platform::ipc::Connection> connection);
 [[nodiscard]] std::shared_ptr<TAVFlusherListener>
 makeFlusherListenerProxy(std::weak_ptr<platform::ipc::Connection> connection);
-
-/// An error as a{sv} (domain, code, userInfo), the empty dictionary for none; and back.
-[[nodiscard]] platform::Value valueFromError(const OptionalError& error);
-[[nodiscard]] OptionalError errorFromValue(const platform::Value& value);
 
 } // namespace tavrin

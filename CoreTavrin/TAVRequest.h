@@ -6,6 +6,7 @@
 #include <string>
 #include <vector>
 
+#include "CoreTavrin/TAVSessionConfiguration.h"
 #include "platform/net/Url.h"
 #include "platform/values/Record.h"
 #include "searchrecords/ZREnums.h"
@@ -43,6 +44,14 @@ struct TAVRequest : platform::RecordOf<TAVRequest> {
     std::optional<std::string> uuid;
     std::optional<std::string> keyboardInputMode; ///< missing: the current keyboard's
     platform::Value topics;                       ///< the user's top topics: an array or dictionary, or null
+    /// From a caller that can make one call only, such as busctl, which introduces itself inside its request.
+    std::shared_ptr<TAVSessionConfiguration> configuration;
+
+    /// Why the daemon refuses the call that brings this record; none if it doesn't.
+    [[nodiscard]] std::optional<std::string> problem() const
+    {
+        return configuration ? configuration->problem() : std::nullopt;
+    }
 
     static constexpr auto fields()
     {
@@ -55,7 +64,8 @@ struct TAVRequest : platform::RecordOf<TAVRequest> {
                           platform::field("triggerEvent", &TAVRequest::triggerEvent),
                           platform::field("uuid", &TAVRequest::uuid),
                           platform::field("keyboardInputMode", &TAVRequest::keyboardInputMode),
-                          platform::field("topics", &TAVRequest::topics)};
+                          platform::field("topics", &TAVRequest::topics),
+                          platform::field("configuration", &TAVRequest::configuration)};
     }
 };
 

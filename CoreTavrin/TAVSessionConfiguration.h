@@ -25,6 +25,15 @@ struct TAVSessionConfiguration : platform::RecordOf<TAVSessionConfiguration> {
         : identifier(std::move(identifier_)), userAgent(std::move(userAgent_))
     {}
 
+    /// Longest identifier and user agent, in bytes: the daemon keeps both for its life.
+    static constexpr std::size_t kMaximumName = 1024;
+    /// Why the daemon refuses the call that brings this record; none if it doesn't.
+    [[nodiscard]] std::optional<std::string> problem() const
+    {
+        if (identifier.value_or("").size() <= kMaximumName && userAgent.value_or("").size() <= kMaximumName) return {};
+        return "identifier and userAgent may have " + std::to_string(kMaximumName) + " bytes each";
+    }
+
     static constexpr auto fields()
     {
         using Self = TAVSessionConfiguration;

@@ -291,7 +291,8 @@ private:
     {
         const char* type = nullptr;
         switch (value.type()) {
-        case Value::Type::Null: break;
+        case Value::Type::Null:
+        case Value::Type::Dictionary: type = "a{sv}"; break;
         case Value::Type::Bool: type = "b"; break;
         case Value::Type::Int: type = "x"; break;
         case Value::Type::UInt: type = "t"; break;
@@ -300,9 +301,7 @@ private:
         case Value::Type::String: type = "s"; break;
         case Value::Type::Bytes: type = "ay"; break;
         case Value::Type::Array: type = "av"; break;
-        case Value::Type::Dictionary: type = "a{sv}"; break;
         }
-        if (!type) return mismatch("v");
         const auto date = value.asDate();
         return check(sd_bus_message_open_container(_bus, SD_BUS_TYPE_VARIANT, type)) &&
                (date ? appendBasic('d', secondsSince1970(*date)) : append(type, value)) &&

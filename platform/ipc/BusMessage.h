@@ -33,7 +33,8 @@ inline constexpr std::size_t kMaximumHandles = 16;
                                                                          std::size_t maximumSize);
 
 /// Appends `message` to a new bus message by `signature` and answers its size, as `Limits` counts it. A null argument
-/// travels as its type's zero; null entries of dictionaries are left out; texts are repaired by `busText`. Fails,
+/// travels as its type's zero; null entries of dictionaries are left out, null elements
+/// of arrays travel as empty dictionaries; texts are repaired by `busText`. Fails,
 /// naming the argument, where a value doesn't fit its type; the bus message is of no use then.
 [[nodiscard]] std::expected<std::size_t, std::string> encodeArguments(sd_bus_message* bus, std::string_view signature,
                                                                       const Message& message);

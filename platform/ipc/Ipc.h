@@ -28,7 +28,7 @@ namespace platform::ipc {
 /// Their D-Bus signature says how they travel: s, x, t, u, i, b, d as the like values, "ay" as Bytes, "a{sv}" as a
 /// dictionary, "aa{sv}" and "as" as arrays, "ah" as an array of indexes into `handles`. Inside "v" a value's own type
 /// decides: bool b, integers x or t, double d, string s, bytes ay, arrays av, dictionaries a{sv}; dates are doubles.
-/// The null value can't travel: leave such dictionary entries out.
+/// A null can't travel: such dictionary entries are left out, such array elements become empty dictionaries.
 struct Message {
     std::vector<Value> args;
     std::vector<FileHandle> handles;
@@ -37,11 +37,12 @@ struct Message {
 /// One member of an interface, with D-Bus signatures of its arguments.
 struct Member {
     std::string_view name;
-    std::string_view in;  ///< of the call, or of the signal
-    std::string_view out; ///< of the reply; empty for a signal
-    bool noReply = false; ///< the answer is empty; callers needn't ask for it
-    /// The interface that the member belongs to, where that isn't the object's own.
-    std::string_view interface = {};
+    std::string_view in;             ///< of the call, or of the signal
+    std::string_view out;            ///< of the reply; empty for a signal
+    bool noReply = false;            ///< the answer is empty; callers needn't ask for it
+    std::string_view interface = {}; ///< that the member belongs to; empty: the object's own
+    std::string_view inNames = {};   ///< of the arguments of `in`, separated by blanks; for error texts
+    std::string_view outNames = {};
 };
 
 /// What an exported object offers, and what it pushes.

@@ -1,5 +1,7 @@
 #include "CoreTavrin/TAVBag.h"
 
+#include <fstream>
+
 #include <gtest/gtest.h>
 
 #include "platform/values/Json.h"
@@ -49,26 +51,8 @@ TEST(TAVBag, AClientSeesItsOwnView)
 // Every key with every wrong type reads as if it were missing, and is named once.
 TEST(TAVBag, WrongTypesReadAsDefaultsAndAreNamed)
 {
-    const std::vector<std::string> keys{"version",
-                                        "isEnabled",
-                                        "feedbackEnabled",
-                                        "minimumQueryLength",
-                                        "timeoutIntervalForRequest",
-                                        "searchURL",
-                                        "warmURL",
-                                        "flightURL",
-                                        "feedbackURL",
-                                        "crowdsourcingURL",
-                                        "imageURL",
-                                        "sendGeoEnvironmentHeader",
-                                        "supportedGeoLocationSources",
-                                        "hashtagImagesVisible",
-                                        "subscriptionProviderDomainWhitelist",
-                                        "subscriptionProviderBundleIdentifierWhitelist",
-                                        "subscriptionTTL",
-                                        "clients",
-                                        "TAVLookupHintsWeekly"};
-    for (const std::string& key : keys) {
+    for (const TAVBag::KnownKey& known : TAVBag::knownKeys()) {
+        const std::string key(known.name);
         unsigned complaints = 0;
         for (const char* value : {"true", "-1", "1e99", "\"ftp://x/\"", "\"\"", "[]", "{}"}) {
             const TAVBag bag = bagOf("{\"" + key + "\": " + value + ", \"clients2\": 1}", "news/1");
@@ -85,6 +69,14 @@ TEST(TAVBag, WrongTypesReadAsDefaultsAndAreNamed)
     }
     EXPECT_EQ(bagOf(R"({"clients": {"news": {"isEnabled": 3}}})").problems().front(),
               "clients.news.isEnabled: expected true or false");
+}
+
+TEST(TAVBag, EveryKeyIsDocumented)
+{
+    std::ifstream file(SOURCE_DIR "/docs/bag.md");
+    const std::string page(std::istreambuf_iterator<char>(file), {});
+    for (const TAVBag::KnownKey& key : TAVBag::knownKeys())
+        EXPECT_TRUE(page.contains("`" + std::string(key.name) + "`")) << key.name;
 }
 
 TEST(TAVBag, CrossesIpcWhole)

@@ -1,3 +1,4 @@
+#include <regex>
 #include <sys/mman.h>
 #include <thread>
 #include <unistd.h>
@@ -287,6 +288,57 @@ TEST_F(ClientTest, AReportedEventIsTakenOrRefused)
     ASSERT_TRUE(client->wait([&] { return taken.size() == 2; }, 30s));
     EXPECT_EQ(taken, (std::vector<bool>{true, false}));
     EXPECT_TRUE(client->status()) << "the connection lives on";
+}
+
+/// The members that an introspection text describes, a line each.
+std::vector<std::string> membersIn(std::string_view introspection)
+{
+    const std::regex tag(R"re(<(interface|method|signal|arg|annotation) name="([^"]+)"(?: type="([^"]+)")?)re"
+                         R"re((?: direction="([^"]+)")?(?: value="([^"]+)")?)re");
+    std::vector<std::string> members;
+    std::string interface, in, out, inNames, outNames, name, suffix;
+    const auto finish = [&] {
+        if (!name.empty())
+            members.push_back(interface + "." + name + "(" + in + inNames + ")" + out + outNames + suffix);
+        in = out = inNames = outNames = name = suffix = "";
+    };
+    for (std::cregex_iterator found(introspection.begin(), introspection.end(), tag), end; found != end; ++found) {
+        const std::string kind = (*found)[1];
+        if (kind == "arg") {
+            ((*found)[4] == "out" ? out : in) += (*found)[3];
+            ((*found)[4] == "out" ? outNames : inNames) += " " + std::string((*found)[2]);
+        } else if (kind == "annotation") {
+            suffix = " " + std::string((*found)[2]) + " " + std::string((*found)[5]);
+        } else {
+            finish();
+            (kind == "interface" ? interface : name) = (*found)[2];
+        }
+    }
+    finish();
+    return members;
+}
+
+std::vector<std::string> membersOf(const platform::ipc::Interface& interface)
+{
+    std::vector<std::string> members;
+    const auto add = [&](std::string_view home, const std::vector<platform::ipc::Member>& all) {
+        for (const auto& member : all) {
+            const auto names = [](std::string_view list) { return list.empty() ? "" : " " + std::string(list); };
+            members.push_back(std::string(member.interface.empty() ? home : member.interface) + "." +
+                              std::string(member.name) + "(" + std::string(member.in) + names(member.inNames) + ")" +
+                              std::string(member.out) + names(member.outNames) +
+                              (member.noReply ? " org.freedesktop.DBus.Method.NoReply true" : ""));
+        }
+    };
+    add(interface.name, interface.methods);
+    add(interface.listenerName, interface.signals);
+    return members;
+}
+
+TEST(Introspection, DescribesEveryMemberAsItIsServed)
+{
+    for (const platform::ipc::Interface* interface : {&daemonInterface(), &endpointInterface(), &flusherInterface()})
+        EXPECT_THAT(membersIn(interface->introspection), testing::UnorderedElementsAreArray(membersOf(*interface)));
 }
 
 TEST(Client, WithoutADaemonSaysWhereItLooked)
