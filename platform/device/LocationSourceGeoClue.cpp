@@ -1,30 +1,25 @@
-// The device's location from GeoClue2, over the system bus. All calls are asynchronous, on the run loop's thread.
-
 #include "platform/device/LocationSourceGeoClue.h"
 
 #include <mutex>
 
-#include <systemd/sd-bus.h>
-
 #include "platform/base/Log.h"
 #include "platform/device/LocationSource.h"
+#include "platform/ipc/SystemBus.h"
 #include "platform/run/RunLoop.h"
+#include "platform/values/Dictionary.h"
 
 namespace platform {
 
 namespace {
 
 constexpr const char* kService = "org.freedesktop.GeoClue2";
-constexpr const char* kManagerPath = "/org/freedesktop/GeoClue2/Manager";
-constexpr const char* kClientInterface = "org.freedesktop.GeoClue2.Client";
-constexpr const char* kLocationInterface = "org.freedesktop.GeoClue2.Location";
 
 // GeoClue's accuracy levels.
 constexpr std::uint32_t kAccuracyCity = 4;
 constexpr std::uint32_t kAccuracyStreet = 6;
 constexpr std::uint32_t kAccuracyExact = 8;
 
-/// GeoClue doesn't say what a fix came from; its accuracy, in metres, does well enough.
+/// GeoClue doesn't say what a fix came from; its accuracy in metres tells it well enough.
 std::string sourceForAccuracy(double metres)
 {
     return metres <= 50 ? "gps" : metres <= 1500 ? "wifi" : "cell";
@@ -32,12 +27,10 @@ std::string sourceForAccuracy(double metres)
 
 class GeoClueLocation final : public LocationSource {
 public:
-    GeoClueLocation(RunLoop& runLoop, std::string desktopId) : _runLoop(runLoop), _desktopId(std::move(desktopId)) {}
-    ~GeoClueLocation() override
-    {
-        sd_bus_slot_unref(_updates);
-        sd_bus_flush_close_unref(_bus);
-    }
+    GeoClueLocation(RunLoop& runLoop, std::string desktopId)
+        : _runLoop(runLoop), _desktopId(std::move(desktopId)),
+          _bus(runLoop, ipc::SystemBus::Bus::System, [this] { forget("the system bus has gone"); })
+    {}
 
     void setAllowedSources(std::set<std::string> sources) override
     {
@@ -50,7 +43,7 @@ public:
     }
     void requestUpdate() override
     {
-        // A running client reports by itself whenever the place changes; only a failed start is worth another try.
+        // A running client reports every change of place; only a failed start is worth another try.
         std::lock_guard lock(_mutex);
         if (!_wantsRestart) return;
         _wantsRestart = false;
@@ -68,114 +61,78 @@ private:
         if (sources == _allowed) return;
         _allowed = sources;
         if (_allowed.empty()) return stop("no source is allowed");
-        // A client keeps the accuracy that it was started with, and the last place is told again to none.
-        if (!_clientPath.empty()) stop("other sources are allowed");
+        // A client keeps the accuracy that it was started with, and is not told its last place again.
+        if (_client) stop("other sources are allowed");
         start();
     }
 
     void start()
     {
-        if (_allowed.empty() || _isAsking || !_clientPath.empty()) return;
-        if (!_bus) {
-            if (const int failed = sd_bus_open_system(&_bus); failed < 0) return lose("no system bus", true);
-            sd_bus_attach_event(_bus, _runLoop.handle(), SD_EVENT_PRIORITY_NORMAL);
-        }
-        _isAsking = sd_bus_call_method_async(_bus, nullptr, kService, kManagerPath, "org.freedesktop.GeoClue2.Manager",
-                                             "GetClient", handler<&GeoClueLocation::gotClient>, this, "") >= 0;
+        if (_allowed.empty() || _isAsking || _client) return;
+        _isAsking = true;
+        _bus.call({kService, "/org/freedesktop/GeoClue2/Manager", "org.freedesktop.GeoClue2.Manager"}, "GetClient",
+                  [this](const ipc::CallResult& result) { gotClient(result); });
     }
 
-    int gotClient(sd_bus_message* message)
+    void gotClient(const ipc::CallResult& result)
     {
-        const char* path = nullptr;
         _isAsking = false;
-        if (_allowed.empty()) return 0;
-        if (sd_bus_message_is_method_error(message, nullptr) || sd_bus_message_read(message, "o", &path) < 0) {
-            lose("GeoClue is not there", true);
-            return 0;
-        }
-        _clientPath = path;
-        sd_bus_match_signal_async(_bus, &_updates, kService, path, kClientInterface, "LocationUpdated",
-                                  handler<&GeoClueLocation::locationUpdated>, nullptr, this);
-        setClientProperty("DesktopId", "s", _desktopId.c_str());
-        const std::uint32_t accuracy = _allowed.contains("gps")    ? kAccuracyExact
-                                       : _allowed.contains("wifi") ? kAccuracyStreet
-                                                                   : kAccuracyCity;
-        setClientProperty("RequestedAccuracyLevel", "u", accuracy);
-        sd_bus_call_method_async(_bus, nullptr, kService, path, kClientInterface, "Start",
-                                 handler<&GeoClueLocation::started>, this, "");
-        return 0;
+        if (_allowed.empty()) return;
+        const std::string* path = result && !result->args.empty() ? result->args[0].asString() : nullptr;
+        if (!path) return lose(result ? "GeoClue gave no client" : result.error().message, true);
+        _client = {kService, *path, "org.freedesktop.GeoClue2.Client"};
+        _updates = _bus.onSignal(*_client, "LocationUpdated", [this](const ipc::CallResult& places) {
+            // The place before, and the place now.
+            if (places && places->args.size() == 2 && places->args[1].asString()) read(*places->args[1].asString());
+        });
+        _owner = _bus.onOwnerChange(kService, [this] { forget("GeoClue has gone"); });
+        _bus.setProperty(*_client, "DesktopId", "s", _desktopId);
+        _bus.setProperty(*_client, "RequestedAccuracyLevel", "u",
+                         _allowed.contains("gps")    ? kAccuracyExact
+                         : _allowed.contains("wifi") ? kAccuracyStreet
+                                                     : kAccuracyCity);
+        _bus.call(*_client, "Start", [this](const ipc::CallResult& started) {
+            if (!started) forget(started.error().message);
+        });
     }
 
-    template <class T> void setClientProperty(const char* name, const char* type, T value)
+    void read(const std::string& place)
     {
-        sd_bus_call_method_async(_bus, nullptr, kService, _clientPath.c_str(), "org.freedesktop.DBus.Properties", "Set",
-                                 nullptr, nullptr, "ssv", kClientInterface, name, type, value);
-    }
-
-    int started(sd_bus_message* message)
-    {
-        if (const sd_bus_error* error = sd_bus_message_get_error(message)) {
-            _clientPath.clear();
-            _updates = sd_bus_slot_unref(_updates);
-            lose(error->message ? error->message : "GeoClue refused", true);
-        }
-        return 0;
-    }
-
-    int locationUpdated(sd_bus_message* message)
-    {
-        const char* before = nullptr;
-        const char* now = nullptr;
-        if (sd_bus_message_read(message, "oo", &before, &now) < 0) return 0;
-        sd_bus_call_method_async(_bus, nullptr, kService, now, "org.freedesktop.DBus.Properties", "GetAll",
-                                 handler<&GeoClueLocation::gotLocation>, this, "s", kLocationInterface);
-        return 0;
-    }
-
-    int gotLocation(sd_bus_message* message)
-    {
-        std::optional<double> latitude;
-        std::optional<double> longitude;
-        double accuracy = 1e6;
-        if (sd_bus_message_is_method_error(message, nullptr)) return 0;
-        if (sd_bus_message_enter_container(message, 'a', "{sv}") < 0) return 0;
-        while (sd_bus_message_enter_container(message, 'e', "sv") > 0) {
-            const char* name = nullptr;
-            double number = 0;
-            if (sd_bus_message_read(message, "s", &name) < 0) return 0;
-            const std::string_view key = name;
-            const bool wanted = key == "Latitude" || key == "Longitude" || key == "Accuracy";
-            if (!wanted)
-                sd_bus_message_skip(message, "v");
-            else if (sd_bus_message_read(message, "v", "d", &number) < 0)
-                return 0;
-            if (key == "Latitude")
-                latitude = number;
-            else if (key == "Longitude")
-                longitude = number;
-            else if (key == "Accuracy")
-                accuracy = number;
-            sd_bus_message_exit_container(message);
-        }
-        if (!latitude || !longitude) return 0;
-        std::string source = sourceForAccuracy(accuracy);
-        if (!_allowed.contains(source)) {
-            lose("its source is not allowed", false);
-            return 0;
-        }
-        set(fuzz(*latitude, *longitude, std::move(source)), "");
-        return 0;
+        _bus.getProperties({kService, place, "org.freedesktop.GeoClue2.Location"}, [this](const auto& properties) {
+            if (!properties) return;
+            const auto number = [&](const char* name) {
+                const Value* value = properties->find(name);
+                return value ? value->asDouble() : std::nullopt;
+            };
+            const auto latitude = number("Latitude");
+            const auto longitude = number("Longitude");
+            if (!latitude || !longitude) return;
+            constexpr double kUnknown = 1e6;
+            std::string source = sourceForAccuracy(number("Accuracy").value_or(kUnknown));
+            if (!_allowed.contains(source)) return lose("its source is not allowed", false);
+            set(fuzz(*latitude, *longitude, std::move(source)), "");
+        });
     }
 
     void stop(const char* reason)
     {
-        _updates = sd_bus_slot_unref(_updates);
-        if (!_clientPath.empty()) {
-            sd_bus_call_method_async(_bus, nullptr, kService, _clientPath.c_str(), kClientInterface, "Stop", nullptr,
-                                     nullptr, "");
-            _clientPath.clear();
-        }
+        if (_client) _bus.call(*_client, "Stop");
+        endClient();
         lose(reason, false);
+    }
+
+    /// The client is dead already, and another one may be asked for.
+    void forget(const std::string& reason)
+    {
+        endClient();
+        lose(reason, true);
+    }
+
+    void endClient()
+    {
+        _updates.reset();
+        _owner.reset();
+        _client.reset();
     }
 
     void lose(const std::string& reason, bool mayRestart)
@@ -200,22 +157,16 @@ private:
         if (handler) handler(location, reason);
     }
 
-    /// A bus callback that calls a member.
-    template <int (GeoClueLocation::*member)(sd_bus_message*)>
-    static int handler(sd_bus_message* message, void* self, sd_bus_error*)
-    {
-        return (static_cast<GeoClueLocation*>(self)->*member)(message);
-    }
-
     static constexpr int kMaximumRestarts = 3;
 
     RunLoop& _runLoop;
     const std::string _desktopId;
-    sd_bus* _bus = nullptr; // loop's thread, like the next four
-    sd_bus_slot* _updates = nullptr;
+    ipc::SystemBus _bus; // run loop's thread, like the next five
+    ipc::SystemBus::Watch _updates;
+    ipc::SystemBus::Watch _owner;
     bool _isAsking = false; // for a client
     std::set<std::string> _allowed;
-    std::string _clientPath;
+    std::optional<ipc::SystemBus::Object> _client;
     std::mutex _mutex;
     std::optional<Location> _current; // under the mutex, like the next three
     bool _wantsRestart = false;

@@ -1,10 +1,8 @@
 #include "platform/device/SystemNotifierSessionBus.h"
 
-#include <systemd/sd-bus.h>
-
 #include "platform/base/Log.h"
-#include "platform/device/Device.h"
 #include "platform/device/SystemNotifier.h"
+#include "platform/ipc/SystemBus.h"
 #include "platform/run/RunLoop.h"
 
 namespace platform {
@@ -14,33 +12,23 @@ namespace {
 class SessionBusNotifier final : public SystemNotifier {
 public:
     SessionBusNotifier(RunLoop& runLoop, std::string path, std::string interface)
-        : _runLoop(runLoop), _path(std::move(path)), _interface(std::move(interface))
+        : _runLoop(runLoop), _path(std::move(path)), _interface(std::move(interface)),
+          _bus(runLoop, ipc::SystemBus::Bus::User)
     {}
-    ~SessionBusNotifier() override { sd_bus_flush_close_unref(_bus); }
 
     void post(const std::string& name) override
     {
-        _runLoop.execute(Priority::Default, [this, name] { emit(name); });
+        _runLoop.execute(Priority::Default, [this, name] {
+            if (!_bus.emit(_path, _interface, "Posted", name))
+                defaultLog().info("no session bus takes the signal {}", name);
+        });
     }
 
 private:
-    void emit(const std::string& name)
-    {
-        if (!_bus) {
-            if (sd_bus_open_user(&_bus) < 0) return defaultLog().info("no session bus to tell {}", name);
-            sd_bus_attach_event(_bus, _runLoop.handle(), SD_EVENT_PRIORITY_NORMAL);
-        }
-        if (const int sent = sd_bus_emit_signal(_bus, _path.c_str(), _interface.c_str(), "Posted", "s", name.c_str());
-            sent < 0) {
-            defaultLog().error("the session bus didn't take {}", name);
-            _bus = sd_bus_flush_close_unref(_bus); // another try with the next
-        }
-    }
-
     RunLoop& _runLoop;
     const std::string _path;
     const std::string _interface;
-    sd_bus* _bus = nullptr; // loop's thread
+    ipc::SystemBus _bus; // run loop's thread
 };
 
 } // namespace

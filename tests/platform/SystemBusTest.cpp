@@ -264,6 +264,13 @@ TEST_F(SystemBusTest, GeoClueIsAskedAsExactlyAsIsAllowedAndAnewWhereThatChanges)
     geo = {.latitude = -33.9, .longitude = 18.4, .started = geo.started};
     geo.fix(service);
     EXPECT_TRUE(becomes(fuzz(-33.9, 18.4, "gps")));
+    sd_bus_release_name(service, "org.freedesktop.GeoClue2");
+    EXPECT_TRUE(becomes(std::nullopt));
+    EXPECT_EQ(told.back(), "GeoClue has gone");
+    sd_bus_request_name(service, "org.freedesktop.GeoClue2", 0);
+    location->requestUpdate();
+    EXPECT_TRUE(becomes(fuzz(-33.9, 18.4, "gps"))) << "back again";
+    ++started;
     location->setAllowedSources({});
     EXPECT_TRUE(becomes(std::nullopt));
     location->setAllowedSources({"gps"});

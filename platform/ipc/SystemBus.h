@@ -1,0 +1,85 @@
+#pragma once
+
+#include <functional>
+#include <memory>
+#include <string>
+
+#include "platform/ipc/BusMessage.h"
+#include "platform/ipc/Ipc.h"
+#include "platform/values/Dictionary.h"
+
+struct sd_bus;
+struct sd_bus_slot;
+
+namespace platform {
+
+class RunLoop;
+
+namespace ipc {
+
+/// A client of the system's or the user's message bus. Every call is asynchronous.
+///
+/// Life: the first request connects, and so does the first request after the bus has gone. Once the destructor has
+/// returned, no handler runs; a handler may destroy its own SystemBus. Confined to the run loop's thread; the run loop
+/// must outlive it.
+class SystemBus {
+public:
+    enum class Bus { System, User };
+
+    /// One interface of one object.
+    struct Object {
+        std::string service; ///< "org.example.Service", or a unique name
+        std::string path;
+        std::string interface;
+    };
+
+    /// `lost` runs when an established connection ends. All watches of that connection are dead then.
+    SystemBus(RunLoop& runLoop, Bus bus, std::function<void()> lost = {});
+    ~SystemBus();
+    SystemBus(const SystemBus&) = delete;
+    SystemBus& operator=(const SystemBus&) = delete;
+
+    /// Connects if necessary. Returns false if there is no bus.
+    bool connect();
+
+    using Answer = std::move_only_function<void(CallResult)>;
+    using Properties = std::move_only_function<void(std::expected<Dictionary, CallError>)>;
+
+    /// Calls a method without arguments; the bus starts the service if it can. `answer` runs once, inside this call if
+    /// nothing can be sent.
+    void call(const Object& object, const char* method, Answer answer = {});
+    /// Reads all properties of the interface, without starting the service. `answer` runs as for `call`, with the
+    /// properties of basic types; others are left out.
+    void getProperties(const Object& object, Properties answer);
+    /// Sets a property of the D-Bus type `type` ("s", "u"). The service's verdict is ignored.
+    void setProperty(const Object& object, const char* name, const char* type, const Value& value);
+    /// Emits a signal with one text from the object at `path`. Returns false if the bus doesn't take it.
+    bool emit(const std::string& path, const std::string& interface, const char* signal, const std::string& text);
+
+    struct EndWatch {
+        void operator()(sd_bus_slot* slot) const;
+    };
+    /// Ends its watch when destroyed. May outlive the bus.
+    using Watch = std::unique_ptr<sd_bus_slot, EndWatch>;
+
+    /// Calls `handler` with the arguments of every such signal. Null if there is no bus.
+    [[nodiscard]] Watch onSignal(const Object& object, const char* signal, Answer handler);
+    /// Calls `handler` when the service's name gets another owner or none. Null if there is no bus.
+    [[nodiscard]] Watch onOwnerChange(const std::string& service, std::function<void()> handler);
+
+private:
+    /// Receives one message; null if none can come.
+    using Receiver = std::move_only_function<void(sd_bus_message*)>;
+
+    [[nodiscard]] BusMessage newCall(const Object& object, const std::string& interface, const char* method);
+    void send(BusMessage call, Receiver receiver);
+
+    RunLoop& _runLoop;
+    const Bus _which;
+    const std::function<void()> _lost;
+    sd_bus* _bus = nullptr;
+    Watch _disconnected;
+};
+
+} // namespace ipc
+} // namespace platform
