@@ -4,6 +4,7 @@
 #include <cstdint>
 #include <filesystem>
 #include <functional>
+#include <limits>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -34,13 +35,16 @@ void require(bool holds, const std::string& what);
 /// Waits, at no cost.
 void pass(double seconds);
 
+/// The limit of a figure that is reported only.
+inline constexpr double kReportedOnly = std::numeric_limits<double>::infinity();
+
 /// One line of the report: a figure of ours beside what it is compared with.
 struct Row {
     std::string what;
     std::string ours;
     std::string beside; ///< empty: compared with nothing
     double figure = 0;  ///< the ratio, or the figure itself
-    double limit = 0;   ///< at most; infinite: it is reported only
+    double limit = 0;   ///< at most
     std::string unit;   ///< of figure and limit; "×" for a ratio
 };
 

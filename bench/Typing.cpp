@@ -3,7 +3,6 @@
 
 #include <cstdio>
 #include <cstdlib>
-#include <limits>
 
 #include <curl/curl.h>
 #include <fmt/format.h>
@@ -25,8 +24,6 @@ using platform::Value;
 using replay::percentile;
 
 namespace {
-
-constexpr double kReportedOnly = std::numeric_limits<double>::infinity();
 
 constexpr std::size_t kAnswerSize = 20'000;
 constexpr double kScale = 2;

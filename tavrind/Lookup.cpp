@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <iterator>
+#include <map>
 #include <string_view>
 #include <unordered_set>
 #include <utility>
@@ -55,46 +56,41 @@ float numberIn(const Value& value)
     return static_cast<float>(value.asDouble().value_or(0));
 }
 
-/// The weights of those keywords that the text has, each once; of a word that comes twice the last weight counts.
+/// Sums the weights of the keywords that the context contains. Every word counts once, with its last weight.
 float keywordScore(const Value& keywords, const platform::LocalizedSearch& context)
 {
-    const Value::Array* array = keywords.asArray();
-    if (!array) return 0;
-    std::vector<std::pair<std::string_view, float>> weights;
-    weights.reserve(array->size());
-    for (const Value& keyword : *array)
-        if (const std::string* word = keyword["word"].asString())
-            weights.emplace_back(*word, numberIn(keyword["weight"]));
-    const auto wordIn = [](const auto& entry) { return entry.first; };
-    std::ranges::stable_sort(weights, {}, wordIn);
+    std::map<std::string_view, float> weights;
+    if (const Value::Array* array = keywords.asArray())
+        for (const Value& keyword : *array)
+            if (const std::string* word = keyword["word"].asString()) weights[*word] = numberIn(keyword["weight"]);
     float score = 0;
-    for (auto each = weights.begin(); each != weights.end(); ++each) {
-        const bool last = std::next(each) == weights.end() || wordIn(*std::next(each)) != wordIn(*each);
-        if (last && context.contains(each->first)) score += each->second;
-    }
+    for (const auto& [word, weight] : weights)
+        if (context.contains(word)) score += weight;
     return score;
 }
 
-/// Of the distinct words of two texts, how many of all are in both.
-float jaccardIndex(const std::unordered_set<std::string_view>& context, const std::vector<std::string>& subjectWords)
+using Words = std::unordered_set<std::string>;
+
+Words wordsIn(std::string_view text, platform::WordFinder& finder)
 {
-    std::vector<std::string_view> subject(subjectWords.begin(), subjectWords.end());
-    std::ranges::sort(subject, [](auto a, auto b) { return a.size() != b.size() ? a.size() < b.size() : a < b; });
-    const auto repeated = std::ranges::unique(subject);
-    subject.erase(repeated.begin(), repeated.end());
-    const auto shared = std::ranges::count_if(subject, [&](const auto& word) { return context.contains(word); });
-    const std::size_t all = context.size() + subject.size() - static_cast<std::size_t>(shared);
+    std::vector<std::string> words = finder.wordsIn(text);
+    return {std::move_iterator(words.begin()), std::move_iterator(words.end())};
+}
+
+float jaccardIndex(const Words& a, const Words& b)
+{
+    const auto shared =
+        static_cast<std::size_t>(std::ranges::count_if(b, [&](const std::string& word) { return a.contains(word); }));
+    const std::size_t all = a.size() + b.size() - shared;
     return all == 0 ? 0 : static_cast<float>(shared) / static_cast<float>(all);
 }
 
-/// What results are measured against: the text around the word that is looked up.
+/// The text around the word that is looked up, which results are measured against.
 class LookupContext {
 public:
-    LookupContext(std::string_view text, const std::string& locale) : _search(text, locale), _finder(locale)
-    {
-        _text = _finder.wordsIn(text);
-        _words.insert(_text.begin(), _text.end());
-    }
+    LookupContext(std::string_view text, const std::string& locale)
+        : _search(text, locale), _finder(locale), _words(wordsIn(text, _finder))
+    {}
 
     [[nodiscard]] bool keeps(const Value& instructions)
     {
@@ -110,7 +106,7 @@ public:
         const float subjectMinimum = numberIn(instructions["min_subject_score"]);
         if (subjectMinimum == 0) return true;
         const std::string* subject = instructions["subject"].asString();
-        const float index = !subject || subject->empty() ? 0 : jaccardIndex(_words, _finder.wordsIn(*subject));
+        const float index = !subject || subject->empty() ? 0 : jaccardIndex(_words, wordsIn(*subject, _finder));
         if (subjectMinimum > index) {
             log().debug("dropping lookup result. jaccard index: {:f} min subject score: {:f}", index, subjectMinimum);
             return false;
@@ -121,8 +117,7 @@ public:
 private:
     platform::LocalizedSearch _search;
     platform::WordFinder _finder;
-    std::vector<std::string> _text;
-    std::unordered_set<std::string_view> _words; // of the text
+    const Words _words;
 };
 
 } // namespace

@@ -1,14 +1,10 @@
 #include "platform/text/Text.h"
 
 #include <algorithm>
-#include <bit>
-#include <cstdint>
-#include <utility>
 
 #include <unicode/brkiter.h>
 #include <unicode/bytestream.h>
 #include <unicode/casemap.h>
-#include <unicode/coleitr.h>
 #include <unicode/coll.h>
 #include <unicode/stsearch.h>
 #include <unicode/tblcoll.h>
@@ -70,7 +66,7 @@ icu::UnicodeString unicode(std::string_view text)
     return icu::UnicodeString::fromUTF8(icu::StringPiece(text.data(), static_cast<int32_t>(text.size())));
 }
 
-/// A name that is none stands for no language at all.
+/// An invalid locale name falls back to the root locale.
 icu::Locale localeOf(const std::string& name)
 {
     const icu::Locale locale(name.c_str());
@@ -97,7 +93,7 @@ std::string_view trimmed(std::string_view text)
 }
 
 struct WordFinder::Impl {
-    std::unique_ptr<icu::BreakIterator> iterator; // null where ICU has none
+    std::unique_ptr<icu::BreakIterator> iterator; // null if ICU has none
 };
 
 WordFinder::WordFinder(const std::string& locale) : _impl(std::make_unique<Impl>())
@@ -134,125 +130,20 @@ std::vector<std::string> WordFinder::wordsIn(std::string_view text)
     return words;
 }
 
-namespace {
-
-constexpr std::uint32_t kNoElement = UINT32_MAX;
-
-/// What a text compares as: a weight, of the characters in [begin, end). The second and later weights of a character
-/// are of no characters.
-struct Element {
-    std::uint32_t weight;
-    int32_t begin, end;
-    std::uint32_t next = kNoElement; // in the same bucket
-};
-
-/// Of the orders that ICU's iterators give, what counts: accents do, case doesn't. 0 of what counts for nothing.
-std::uint32_t weightOf(int32_t order)
-{
-    return static_cast<std::uint32_t>(order) & 0xffffff00;
-}
-
-/// Whether a user takes what is before `at` and what is behind it for different characters. False where that would need
-/// looking into: below U+0300 nothing combines.
-bool surelyBetweenCharacters(const icu::UnicodeString& text, int32_t at)
-{
-    constexpr char16_t kFirstCombining = 0x300;
-    if (at == 0 || at == text.length()) return true;
-    return text[at - 1] < kFirstCombining && text[at] < kFirstCombining && text[at] != u'\n';
-}
-
-} // namespace
-
-/// Looking for a part with ICU's search takes longer than all else that a caller does with it, as it goes through the
-/// text's weights each time. Here they are kept in an index, and ICU's search decides where it isn't clear from them.
 struct LocalizedSearch::Impl {
     icu::UnicodeString text;
-    std::unique_ptr<icu::RuleBasedCollator> collator;            // null where ICU has none
-    std::vector<Element> elements;                               // of the text
-    std::vector<std::uint32_t> buckets;                          // first elements, by weight and next weight
-    std::unique_ptr<icu::CollationElementIterator> partIterator; // null where the index isn't used
-    std::vector<std::uint32_t> part;
-
-    Impl(std::string_view text_, const std::string& locale) : text(unicode(text_))
-    {
-        UErrorCode status = U_ZERO_ERROR;
-        std::unique_ptr<icu::Collator> any(icu::Collator::createInstance(localeOf(locale), status));
-        if (U_FAILURE(status) || !dynamic_cast<icu::RuleBasedCollator*>(any.get())) return;
-        collator.reset(static_cast<icu::RuleBasedCollator*>(any.release()));
-        collator->setStrength(icu::Collator::SECONDARY);
-        // Where punctuation counts for nothing, that depends on what follows it.
-        if (collator->getAttribute(UCOL_ALTERNATE_HANDLING, status) != UCOL_NON_IGNORABLE || U_FAILURE(status)) return;
-        index();
-    }
-
-    void index()
-    {
-        const std::unique_ptr<icu::CollationElementIterator> iterator(collator->createCollationElementIterator(text));
-        partIterator.reset(collator->createCollationElementIterator(icu::UnicodeString()));
-        if (!iterator || !partIterator) return partIterator.reset();
-        UErrorCode status = U_ZERO_ERROR;
-        int32_t begin = 0;
-        for (int32_t order; (order = iterator->next(status)) != icu::CollationElementIterator::NULLORDER;) {
-            if (U_FAILURE(status)) return partIterator.reset();
-            const int32_t end = iterator->getOffset();
-            if (const std::uint32_t weight = weightOf(order)) elements.push_back({weight, begin, end});
-            begin = end;
-        }
-        buckets.resize(std::bit_ceil(elements.size() + 1), kNoElement);
-        for (std::size_t i = elements.size(); i-- > 1;) {
-            std::uint32_t& first = buckets[bucketOf(elements[i - 1].weight, elements[i].weight)];
-            elements[i - 1].next = std::exchange(first, static_cast<std::uint32_t>(i - 1));
-        }
-    }
-
-    [[nodiscard]] std::size_t bucketOf(std::uint32_t weight, std::uint32_t next) const
-    {
-        constexpr std::uint64_t kMix = 0x9e3779b97f4a7c15;
-        return ((weight * kMix ^ next) * kMix >> 32) & (buckets.size() - 1);
-    }
-
-    enum class Found { No, Yes, Perhaps };
-
-    Found find(const icu::UnicodeString& pattern)
-    {
-        UErrorCode status = U_ZERO_ERROR;
-        partIterator->setText(pattern, status);
-        part.clear();
-        for (int32_t order; (order = partIterator->next(status)) != icu::CollationElementIterator::NULLORDER;) {
-            if (U_FAILURE(status)) return Found::Perhaps;
-            if (const std::uint32_t weight = weightOf(order)) part.push_back(weight);
-        }
-        if (part.empty()) return Found::No;
-        const bool single = part.size() == 1; // rare
-        Found found = Found::No;
-        for (std::size_t place = single ? 0 : buckets[bucketOf(part[0], part[1])]; place < elements.size();
-             place = single ? place + 1 : elements[place].next) {
-            if (elements.size() - place < part.size()) continue;
-            const auto begin = elements.begin() + static_cast<std::ptrdiff_t>(place),
-                       end = begin + static_cast<std::ptrdiff_t>(part.size());
-            if (!std::equal(part.begin(), part.end(), begin, [](auto weight, auto& e) { return weight == e.weight; }))
-                continue;
-            const bool whole = begin->begin < begin->end && (end == elements.end() || end->begin < end->end);
-            if (whole && surelyBetweenCharacters(text, begin->begin) && surelyBetweenCharacters(text, (end - 1)->end))
-                return Found::Yes;
-            found = Found::Perhaps;
-        }
-        return found;
-    }
-
-    [[nodiscard]] bool search(const icu::UnicodeString& pattern) const
-    {
-        UErrorCode status = U_ZERO_ERROR;
-        if (collator->compare(pattern, icu::UnicodeString(), status) == UCOL_EQUAL) return false;
-        icu::StringSearch search(pattern, text, collator.get(), nullptr, status);
-        const int32_t found = search.first(status);
-        return U_SUCCESS(status) && found != USEARCH_DONE;
-    }
+    std::unique_ptr<icu::RuleBasedCollator> collator; // null if ICU has none
 };
 
 LocalizedSearch::LocalizedSearch(std::string_view text, const std::string& locale)
-    : _impl(std::make_unique<Impl>(text, locale))
-{}
+    : _impl(std::make_unique<Impl>(unicode(text)))
+{
+    UErrorCode status = U_ZERO_ERROR;
+    std::unique_ptr<icu::Collator> collator(icu::Collator::createInstance(localeOf(locale), status));
+    if (U_FAILURE(status) || !dynamic_cast<icu::RuleBasedCollator*>(collator.get())) return;
+    _impl->collator.reset(static_cast<icu::RuleBasedCollator*>(collator.release()));
+    _impl->collator->setStrength(icu::Collator::SECONDARY); // accents count, case doesn't
+}
 
 LocalizedSearch::~LocalizedSearch() = default;
 LocalizedSearch::LocalizedSearch(LocalizedSearch&&) noexcept = default;
@@ -260,9 +151,12 @@ LocalizedSearch::LocalizedSearch(LocalizedSearch&&) noexcept = default;
 bool LocalizedSearch::contains(std::string_view part) const
 {
     const icu::UnicodeString pattern = unicode(part);
-    if (!_impl->collator || pattern.isEmpty() || _impl->text.isEmpty()) return false;
-    const auto found = _impl->partIterator ? _impl->find(pattern) : Impl::Found::Perhaps;
-    return found == Impl::Found::Perhaps ? _impl->search(pattern) : found == Impl::Found::Yes;
+    UErrorCode status = U_ZERO_ERROR;
+    if (!_impl->collator || _impl->text.isEmpty()) return false;
+    if (_impl->collator->compare(pattern, icu::UnicodeString(), status) == UCOL_EQUAL) return false;
+    icu::StringSearch search(pattern, _impl->text, _impl->collator.get(), nullptr, status);
+    const int32_t found = search.first(status);
+    return U_SUCCESS(status) && found != USEARCH_DONE;
 }
 
 } // namespace platform

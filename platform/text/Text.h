@@ -8,27 +8,29 @@
 
 namespace platform {
 
-/// The length of a UTF-8 text in UTF-16 units. A byte that is no part of valid UTF-8 counts as one.
+/// Counts the UTF-16 units of a UTF-8 text. Every byte that is not part of valid UTF-8 counts as one unit.
 [[nodiscard]] std::size_t utf16Length(std::string_view text);
 
-/// The first `size` bytes of a text, less where they would end within a character (UTF-8).
+/// Returns the longest prefix of at most `size` bytes that ends between two characters (UTF-8).
 [[nodiscard]] std::string_view cut(std::string_view text, std::size_t size);
 
-/// A text in lower case, by Unicode's rules without those of any one language.
+/// Returns the text in lower case, by Unicode's rules without those of any one language.
 [[nodiscard]] std::string lowerCased(std::string_view text);
 
-/// The text without white space (Unicode's White_Space) at its ends.
+/// Returns the text without the white space (Unicode's White_Space) at both ends.
 [[nodiscard]] std::string_view trimmed(std::string_view text);
 
-/// Divides texts into words, as `locale` ("de_CH") does, and keeps what it needs for that: making it costs more than
-/// dividing a sentence. One thread at a time.
+/// Divides texts into words by the rules of a locale.
+///
+/// Construction costs more than dividing a sentence: keep the object. One thread at a time.
 class WordFinder {
 public:
+    /// `locale` is "de_CH" or the like; an invalid name means the root locale.
     explicit WordFinder(const std::string& locale);
     ~WordFinder();
     WordFinder(WordFinder&&) noexcept;
-    /// The words of a text, in order: letters, digits and ideographs, without what is between them. Texts beyond 1 MiB
-    /// are cut off there.
+    /// Returns the words in order: runs of letters, digits or ideographs, without what separates them. Reads at most
+    /// 1 MiB of the text.
     [[nodiscard]] std::vector<std::string> wordsIn(std::string_view text);
 
 private:
@@ -36,16 +38,17 @@ private:
     std::unique_ptr<Impl> _impl;
 };
 
-/// A text to look for others in, as `locale` compares them, without regard to case: "RÉSUMÉ" is in "my résumé", but
-/// "resume" isn't. A part begins and ends where characters do: "e" is not in "é". Made to be asked often. One thread at
-/// a time.
+/// A text that is searched for parts, as a locale compares texts and regardless of case: "my résumé" contains "RÉSUMÉ"
+/// but not "resume". Parts match whole characters: "é" doesn't contain "e".
+///
+/// One thread at a time.
 class LocalizedSearch {
 public:
-    /// Texts beyond 1 MiB are cut off there.
+    /// Keeps at most 1 MiB of the text. An invalid `locale` means the root locale.
     LocalizedSearch(std::string_view text, const std::string& locale);
     ~LocalizedSearch();
     LocalizedSearch(LocalizedSearch&&) noexcept;
-    /// Nothing that compares as empty is contained.
+    /// Returns false for a part that compares as empty.
     [[nodiscard]] bool contains(std::string_view part) const;
 
 private:
