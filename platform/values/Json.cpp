@@ -3,8 +3,10 @@
 #include <algorithm>
 #include <array>
 #include <charconv>
+#include <clocale>
 #include <cmath>
-#include <cstring>
+#include <cstdlib>
+#include <limits>
 
 #include <fmt/format.h>
 #include <openssl/evp.h>
@@ -55,6 +57,90 @@ simdjson::error_code parseBounded(dom::parser& parser, std::string_view text, do
     error = parser.allocate(parser.capacity(), kMaximumDepth + 1);
     if (!error) error = parser.parse(text.data(), text.size()).get(root);
     return !error && nestsDeeper(root, kMaximumDepth) ? simdjson::DEPTH_ERROR : error;
+}
+
+// What a browser reads and the parser refuses
+
+/// The length of the number that the text begins with; 0 if that is not a number of JSON.
+std::size_t numberLength(std::string_view text)
+{
+    std::size_t at = text.starts_with('-') ? 1 : 0;
+    const auto digits = [&] {
+        const std::size_t begin = at;
+        while (at < text.size() && text[at] >= '0' && text[at] <= '9') ++at;
+        return at - begin;
+    };
+    const auto skip = [&](std::string_view any) {
+        const bool found = at < text.size() && any.contains(text[at]);
+        at += found;
+        return found;
+    };
+    const bool leadingZero = text.substr(at).starts_with('0');
+    const std::size_t whole = digits();
+    if (whole == 0 || (leadingZero && whole > 1)) return 0;
+    if (skip(".") && digits() == 0) return 0;
+    if (!skip("eE")) return at;
+    skip("+-");
+    return digits() == 0 ? 0 : at;
+}
+
+/// A number as the parser can read it: integers beyond 64 bits as doubles, numbers beyond a double as the largest one.
+std::string readableNumber(const std::string& text)
+{
+    const auto reads = [&]<class Integer>(Integer number) {
+        const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);
+        return error == std::errc() && end == text.data() + text.size();
+    };
+    const bool isInteger = text.find_first_of(".eE") == std::string::npos;
+    if (isInteger && (reads(std::int64_t{}) || reads(std::uint64_t{}))) return text;
+    static const locale_t plain = newlocale(LC_NUMERIC_MASK, "C", nullptr);
+    const double number = strtod_l(text.c_str(), nullptr, plain);
+    if (!isInteger && std::isfinite(number)) return text;
+    constexpr double kLargest = std::numeric_limits<double>::max();
+    std::array<char, 32> digits;
+    const auto result = std::to_chars(digits.begin(), digits.end(), std::clamp(number, -kLargest, kLargest),
+                                      std::chars_format::scientific);
+    return {digits.begin(), result.ptr};
+}
+
+/// The code unit of an escape "\uXXXX" that the text begins with.
+std::optional<unsigned> escapedUnit(std::string_view text)
+{
+    constexpr std::size_t kLength = 6;
+    unsigned unit = 0;
+    if (!text.starts_with("\\u") || text.size() < kLength) return std::nullopt;
+    const auto [end, error] = std::from_chars(text.data() + 2, text.data() + kLength, unit, 16);
+    return error == std::errc() && end == text.data() + kLength ? std::optional(unit) : std::nullopt;
+}
+
+/// Replaces the numbers and escapes that the parser refuses although a browser reads them. Keeps everything else.
+std::string mended(std::string_view text)
+{
+    std::string result;
+    result.reserve(text.size());
+    bool inString = false;
+    while (!text.empty()) {
+        std::size_t length = 1;
+        if (const auto unit = inString ? escapedUnit(text) : std::nullopt) {
+            length = 6;
+            const auto next = escapedUnit(text.substr(length));
+            const bool high = *unit >= 0xd800 && *unit < 0xdc00;
+            const bool low = *unit >= 0xdc00 && *unit < 0xe000;
+            if (high && next && *next >= 0xdc00 && *next < 0xe000)
+                result += text.substr(0, length *= 2);
+            else
+                result += high || low ? "\\ufffd" : text.substr(0, length);
+        } else if (const std::size_t digits = inString ? 0 : numberLength(text)) {
+            length = digits;
+            result += readableNumber(std::string(text.substr(0, length)));
+        } else {
+            if (inString && text.front() == '\\') length = std::min<std::size_t>(2, text.size());
+            if (text.front() == '"') inString = !inString;
+            result += text.substr(0, length);
+        }
+        text.remove_prefix(length);
+    }
+    return result;
 }
 
 Value convert(dom::element element);
@@ -318,7 +404,9 @@ std::expected<JsonDocument, Error> JsonDocument::parse(std::string_view text, st
     if (text.starts_with("\xef\xbb\xbf")) text.remove_prefix(3);
 
     auto parsed = std::make_unique<Parsed>();
-    const auto error = parseBounded(*parsed->parser, text, parsed->root);
+    auto error = parseBounded(*parsed->parser, text, parsed->root);
+    if (error == simdjson::NUMBER_ERROR || error == simdjson::STRING_ERROR)
+        error = parseBounded(*parsed->parser, mended(text), parsed->root);
     if (error == simdjson::DEPTH_ERROR) return malformed(fmt::format("nested deeper than {}", kMaximumDepth));
     if (error) return malformed(simdjson::error_message(error));
     return JsonDocument(std::move(parsed));

@@ -13,24 +13,26 @@
 
 namespace platform {
 
-/// Reads one JSON document (RFC 8259) of at most `maximumSize` bytes. A leading byte order mark is skipped;
-/// of duplicate keys the last wins. Refused with a reason: invalid UTF-8, integers beyond 64 bits, nesting
-/// beyond `kMaximumDepth`, anything after the document.
+/// Reads one JSON document (RFC 8259) of at most `maximumSize` bytes, as a browser does: a leading byte order mark is
+/// skipped, the last of duplicate keys wins, a lone surrogate escape reads as U+FFFD, an integer beyond 64 bits as a
+/// double, a number beyond a double as the largest one. The error has a reason for what is refused: anything else that
+/// is not JSON, invalid UTF-8, nesting beyond `kMaximumDepth`, text after the document. Any thread.
 [[nodiscard]] std::expected<Value, Error> parseJson(std::string_view text, std::size_t maximumSize = 64u << 20);
 
 enum class JsonStyle { Compact, Pretty };
 
-/// Writes a value as JSON: doubles shortest-exact, integers as integers, bytes as base64, dates as seconds since
-/// 1970, non-finite numbers as null. Invalid UTF-8 in a string is written as U+FFFD.
+/// Writes a value as JSON: doubles in the shortest form that reads back exactly, integers as integers, bytes as base64,
+/// dates as seconds since 1970, non-finite numbers as null. Each byte of invalid UTF-8 becomes U+FFFD.
 [[nodiscard]] std::string toJson(const Value& value, JsonStyle style = JsonStyle::Compact);
-/// The length of `toJson(value)`, without making it.
+/// Returns the length of `toJson(value)` without making the text.
 [[nodiscard]] std::size_t jsonSize(const Value& value);
 
-/// A JSON document that was read, and from which values are made where they are wanted: reading takes a fifth of the
-/// time that making all of its values does. It doesn't need the text any more. Immutable, hence any thread.
+/// A parsed JSON document that makes values on demand: parsing takes a fifth of the time that making all values does.
+///
+/// The text may go after parsing. Immutable: any thread.
 class JsonDocument {
 public:
-    /// As `parseJson` does.
+    /// Reads what `parseJson` reads.
     [[nodiscard]] static std::expected<JsonDocument, Error> parse(std::string_view text,
                                                                   std::size_t maximumSize = 64u << 20);
     JsonDocument(JsonDocument&&) noexcept;
@@ -39,21 +41,24 @@ public:
 
     /// The whole document.
     [[nodiscard]] Value value() const;
-    /// Elements of a document that is an array; 0 for any other.
+
+    // For a document that is an array
+
+    /// The number of elements; 0 if the document is no array.
     [[nodiscard]] std::size_t count() const;
-    /// True if a dictionary among the array's elements has an entry `key`.
+    /// Returns true if a dictionary among the elements has an entry `key`.
     [[nodiscard]] bool anyElementHas(std::string_view key) const;
-    /// The entry `key` of the dictionary that is the array's first element; the null value where there is none.
+    /// Returns the entry `key` of the first element; null if that is no dictionary or has no such entry.
     [[nodiscard]] Value entryOfFirst(std::string_view key) const;
 
-    // Of a document that is a dictionary. Of duplicate keys the last counts.
+    // For a document that is a dictionary; the last of duplicate keys counts
 
-    /// The text that is the entry `key`, for as long as the document lives; none where it is something else.
+    /// Returns the text under `key`, or nothing for any other value. The document owns the text.
     [[nodiscard]] std::optional<std::string_view> textOf(std::string_view key) const;
-    /// Whether the entry `key` is a dictionary.
+    /// Returns true if the value under `key` is a dictionary.
     [[nodiscard]] bool hasDictionary(std::string_view key) const;
-    /// Calls `take` with each entry of the dictionary that is the entry `key` whose name is `wanted`, in their order;
-    /// of duplicate names with each. Only the values of these are made.
+    /// Calls `take` for each entry of the dictionary under `key` whose name is `wanted`, in the document's order and
+    /// once for each duplicate. Makes only these values.
     void eachEntryOf(std::string_view key, const std::function<bool(std::string_view name)>& wanted,
                      const std::function<void(std::string_view name, Value value)>& take) const;
 

@@ -46,6 +46,32 @@ TEST(Json, ReadsEdgeCasesExactly)
     }
 }
 
+TEST(Json, ReadsWhatABrowserReads)
+{
+    struct {
+        std::string_view text;
+        Value expected;
+    } const cases[] = {
+        {R"("\ud800")", "\xef\xbf\xbd"},
+        {R"("a\uDC00\ud83d\ude00\ud83d\ud83d\uDE00\ud800\u0041\ud800")",
+         "a\xef\xbf\xbd\xf0\x9f\x98\x80\xef\xbf\xbd\xf0\x9f\x98\x80\xef\xbf\xbd"
+         "A\xef\xbf\xbd"},
+        {R"({"\ud800":"\\ud800 \"1e400\\","a":1e400})",
+         Value::dictionaryOf({{"\xef\xbf\xbd", R"(\ud800 "1e400\)"}, {"a", std::numeric_limits<double>::max()}})},
+        {"[1e400,-1e999999999999,1e-400,0.1,-1.5E+3,18446744073709551615,-9223372036854775808,7]",
+         Value::Array{std::numeric_limits<double>::max(), -std::numeric_limits<double>::max(), 0.0, 0.1, -1500.0,
+                      UINT64_MAX, INT64_MIN, 7}},
+        {"[18446744073709551616,-9223372036854775809]", Value::Array{18446744073709551616.0, -9223372036854775808.0}},
+    };
+    for (const auto& c : cases) {
+        const auto value = parseJson(c.text);
+        ASSERT_TRUE(value) << c.text << ": " << value.error().description();
+        EXPECT_EQ(*value, c.expected) << c.text << " " << toJson(*value);
+    }
+    const std::string manyDigits = "[" + std::string(400, '9') + "]";
+    EXPECT_EQ(parseJson(manyDigits).value()[0], Value(std::numeric_limits<double>::max()));
+}
+
 TEST(Json, RefusesWhatIsNotJsonWithAReason)
 {
     for (const std::string_view text : {"",
@@ -63,15 +89,18 @@ TEST(Json, RefusesWhatIsNotJsonWithAReason)
                                         "\"\xff\"",
                                         "\"\xed\xa0\x80\"",
                                         "\"\xc0\x80\"",
-                                        R"("\ud800")",
-                                        R"("\ud800\u0041")",
-                                        "18446744073709551616",
-                                        "-9223372036854775809",
-                                        "1e400",
                                         "01",
                                         "+1",
                                         ".5",
                                         "NaN",
+                                        "[01, 1e400]",
+                                        "[+1, 1e400]",
+                                        "[1e400",
+                                        "[1e400 1]",
+                                        "1e400e1",
+                                        R"("\ud8")",
+                                        R"("\ud800\x")",
+                                        R"("\ud800)",
                                         "\xff\xfe[\0]\0"}) {
         const auto value = parseJson(text);
         ASSERT_FALSE(value) << text;
