@@ -62,6 +62,7 @@ Daemon::~Daemon() = default;
 platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device)
 {
     TAVTracingSetup(device.userDefaults);
+    if (device.userDefaults.boolean("TAVLogPrivateData")) platform::Log::privateData = true;
     device.userDefaults.registerDefaults({{"TAVSharedSession", true},
                                           {"TAVSessionSizeLimit", 4u << 20},    // bytes
                                           {"TAVSessionMaxAge", 48 * 60 * 60}}); // seconds

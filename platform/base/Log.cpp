@@ -10,6 +10,7 @@
 namespace platform {
 
 std::atomic<LogLevel> Log::threshold = LogLevel::Default;
+std::atomic<bool> Log::privateData = false;
 
 namespace {
 
@@ -18,14 +19,14 @@ spdlog::level::level_enum spdlogLevel(LogLevel level)
     switch (level) {
     case LogLevel::Debug: return spdlog::level::debug;
     case LogLevel::Info: return spdlog::level::info;
-    case LogLevel::Default: return spdlog::level::warn; // above info, which is off from day to day
+    case LogLevel::Default: return spdlog::level::warn; // above info
     case LogLevel::Error: return spdlog::level::err;
     case LogLevel::Fault: return spdlog::level::critical;
     }
     return spdlog::level::err;
 }
 
-/// The sink; leaked, so that threads may log while the process ends.
+/// The sink; leaked so that threads may log while the process exits.
 std::shared_ptr<spdlog::logger>& sink()
 {
     static auto& logger = *new std::shared_ptr<spdlog::logger>([] {
@@ -41,9 +42,8 @@ std::shared_ptr<spdlog::logger>& sink()
 std::mutex tapMutex;
 std::function<void(const LogLine&)> tap; // under tapMutex
 std::atomic<bool> tapped = false;
-std::atomic<LogLevel> sinkThreshold = LogLevel::Debug; // the lowest level for the sink, while a tap wants all
+std::atomic<LogLevel> sinkThreshold = LogLevel::Debug; // of the sink, while a tap sees every level
 
-/// Texts come from outside too: a newline in a URL must not begin a line of its own.
 std::string withoutControlCharacters(std::string text)
 {
     const auto isControl = [](unsigned char c) { return c < 0x20 || c == 0x7f; };
@@ -70,6 +70,14 @@ std::string_view logLevelName(LogLevel level)
     case LogLevel::Fault: return "fault";
     }
     return "";
+}
+
+std::string Log::shortened(std::string_view text)
+{
+    if (text.size() <= kLongestArgument) return std::string(text);
+    std::size_t end = kLongestArgument;
+    while (end > 0 && (static_cast<unsigned char>(text[end]) & 0xc0) == 0x80) --end;
+    return std::string(text.substr(0, end)) + "…";
 }
 
 void Log::emit(LogLevel level, std::string text) const

@@ -19,6 +19,26 @@ TEST_F(LogTest, TextsFromOutsideCannotForgeLines)
               (std::vector<std::string>{"a\\x0afault forged", "a\\x0d\\x09b", "\\x1b[2J", "\\x7f", "ü 日 \\n {}"}));
 }
 
+TEST_F(LogTest, ArgumentsAreCutAndPrivateOnesAreHidden)
+{
+    std::vector<std::string> lines;
+    const LogTap tap([&](const LogLine& line) { lines.emplace_back(line.text); });
+    const std::string query = "wea", longText = std::string(199, 'x') + "ü and so on";
+    const auto writeAll = [&](bool privateData) {
+        Log::privateData = privateData;
+        log.log("{} {}", 1, Private{query});
+        log.error("{:.1f} {}", 0.5, Private{query + "ther"});
+        log.debug("'{}'", Private{query});
+        log.info("'{}' '{}'", longText, Private{longText});
+    };
+    writeAll(false);
+    writeAll(true);
+    Log::privateData = false;
+    const std::string cut = "'" + std::string(199, 'x') + "…'";
+    EXPECT_EQ(lines, (std::vector<std::string>{"1 <private>", "0.5 <private>", "'wea'", cut + " '<private>'", "1 wea",
+                                               "0.5 weather", "'wea'", cut + " " + cut}));
+}
+
 TEST_F(LogTest, ATapSeesEveryLevelAndThenLeavesThemAsTheyWere)
 {
     std::string seen;

@@ -180,6 +180,7 @@ struct TestDevice {
     {
         failOnReplyMisuse();
         Log::threshold = LogLevel::Fault; // what is expected is captured, not printed
+        Log::privateData = true;
         device.makeQueues();
     }
 
