@@ -12,7 +12,7 @@ using Date = std::chrono::sys_time<std::chrono::nanoseconds>;
 /// A span of time.
 using Duration = std::chrono::nanoseconds;
 
-// Whole seconds and the rest apart: nanoseconds since 1970 are more than a double holds exactly.
+// Conversions treat whole seconds and the rest apart: a double doesn't hold nanoseconds since 1970 exactly.
 
 /// The seconds nearest to `d`.
 [[nodiscard]] inline double toSeconds(Duration d)
@@ -36,6 +36,15 @@ using Duration = std::chrono::nanoseconds;
     if (seconds < -kLimit) seconds = -kLimit;
     const double whole = std::trunc(seconds);
     return std::chrono::seconds(static_cast<std::int64_t>(whole)) + Duration(std::llround((seconds - whole) * 1e9));
+}
+
+/// The moment of a time of the operating system: seconds since 1970 and the nanoseconds beyond them. Clamped to the
+/// years 1970 to 2199, so that neither the difference of two such moments nor a sum with less than 60 years overflows.
+[[nodiscard]] constexpr Date dateFromSystemTime(std::int64_t seconds, std::int64_t nanoseconds)
+{
+    constexpr std::int64_t kLatest = 7'258'118'400;
+    if (seconds < 0 || seconds >= kLatest) return Date(std::chrono::seconds(seconds < 0 ? 0 : kLatest));
+    return Date(std::chrono::seconds(seconds) + std::chrono::nanoseconds(nanoseconds));
 }
 
 /// The moment `seconds` after 1970, clamped like `durationFromSeconds`.

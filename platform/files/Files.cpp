@@ -39,10 +39,9 @@ template <class Call> auto retried(Call call)
     return result;
 }
 
-/// A file may claim a date that nanoseconds since 1970 don't hold.
 Date dateOf(const statx_timestamp& time)
 {
-    return dateFromSecondsSince1970(static_cast<double>(time.tv_sec)) + std::chrono::nanoseconds(time.tv_nsec);
+    return dateFromSystemTime(time.tv_sec, time.tv_nsec);
 }
 
 /// Copies the whole of `from`. False, with errno, if that fails or it is more than `maximumSize` bytes (EFBIG).

@@ -24,7 +24,12 @@ public:
           _watch(runLoop.watch(_timerFd.fd(), EPOLLIN, [this](std::uint32_t) { fireDue(); }))
     {}
 
-    Date wallNow() const override { return std::chrono::time_point_cast<Duration>(std::chrono::system_clock::now()); }
+    Date wallNow() const override
+    {
+        timespec now{};
+        clock_gettime(CLOCK_REALTIME, &now);
+        return dateFromSystemTime(now.tv_sec, now.tv_nsec);
+    }
 
     std::uint64_t hostTicks() const override
     {

@@ -17,5 +17,17 @@ TEST(Date, SecondsAndDatesConvertBothWays)
     EXPECT_EQ(durationFromSeconds(NAN), Duration::zero());
 }
 
+TEST(Date, SystemTimesOfAnyYearCanBeSubtractedAndAdded)
+{
+    using namespace std::chrono_literals;
+    EXPECT_EQ(dateFromSystemTime(1'700'000'000, 250'000'000), dateFromSecondsSince1970(1'700'000'000.25));
+    const Date earliest = dateFromSystemTime(INT64_MIN, 0), latest = dateFromSystemTime(INT64_MAX, 999'999'999);
+    EXPECT_EQ(earliest, Date());
+    EXPECT_LT(dateFromSystemTime(7'000'000'000, 0), latest); // the year 2191
+    EXPECT_EQ(dateFromSystemTime(9'300'000'000, 0), latest); // 2264
+    EXPECT_GT(latest - earliest, 24h * 365 * 229);
+    EXPECT_GT(latest + 24h * 365 * 60, latest);
+}
+
 } // namespace
 } // namespace platform
