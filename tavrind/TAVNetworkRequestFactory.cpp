@@ -576,9 +576,9 @@ void TAVNetworkRequestFactory::didUpdateStorefrontIdentifier(const std::optional
 
 void TAVNetworkRequestFactory::didUpdateSubscriptionDictionaries(const std::vector<Value>& subscriptions)
 {
-    std::string header = subscriptions.empty() ? "" : platform::toJson(Value::Array(subscriptions));
-    _contextAccessQueue->barrierAsync(
-        [self = shared_from_this(), header = std::move(header)] { self->_context.subscriptionInfo = header; });
+    _contextAccessQueue->barrierAsync([self = shared_from_this(), header = subscriptionsHeader(subscriptions)] {
+        self->_context.subscriptionInfo = header;
+    });
 }
 
 } // namespace tavrin

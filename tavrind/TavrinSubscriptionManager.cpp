@@ -4,6 +4,7 @@
 #include "platform/device/Device.h"
 #include "platform/device/DeviceProfile.h"
 #include "platform/device/SubscriptionServices.h"
+#include "platform/values/Json.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/TavrinBagController.h"
 #include "tavrind/TavrinLogging.h"
@@ -22,6 +23,21 @@ const platform::Log& log()
 }
 
 } // namespace
+
+std::string subscriptionsHeader(const std::vector<Value>& subscriptions)
+{
+    constexpr std::size_t kLongest = 4096; // half of what common servers take of all headers
+    std::string header;
+    for (const Value& subscription : subscriptions) {
+        const std::string entry = (header.empty() ? "[" : ",") + platform::toJson(subscription);
+        if (header.size() + entry.size() + 1 > kLongest)
+            log().error("subscription with {} is not sent: the header has at most {} bytes",
+                        platform::toJson(subscription["provider"]), kLongest);
+        else
+            header += entry;
+    }
+    return header.empty() ? header : header + "]";
+}
 
 std::shared_ptr<TavrinSubscriptionManager>
 TavrinSubscriptionManager::make(Assembly& assembly, std::weak_ptr<TavrinSubscriptionManagerDelegate> delegate)
@@ -123,7 +139,8 @@ void TavrinSubscriptionManager::_updateDelegate()
 std::vector<Value> TavrinSubscriptionManager::values() const
 {
     std::vector<Value> all;
-    for (const auto& [provider, subscription] : _subscriptionsByProvider) all.push_back(subscription);
+    for (const auto& [provider, subscription] : _subscriptionsByProvider)
+        all.insert(provider == kFuse ? all.begin() : all.end(), subscription);
     return all;
 }
 

@@ -127,7 +127,7 @@ TEST_F(SubscriptionManagerTest, TheHeaderFollowsTheBagTheProvidersAndTheProfile)
     device.drain();
     device.profile.change({.storefront = "143441", .newsSubscribed = true});
     device.drain();
-    EXPECT_EQ(header(), R"([{"provider":"daily"},{"provider":"fuse","attribute":"premium","active":true}])");
+    EXPECT_EQ(header(), R"([{"provider":"fuse","attribute":"premium","active":true},{"provider":"daily"}])");
     EXPECT_EQ(manager->subscriptions().size(), 2u);
     EXPECT_EQ(factory->context().storeFrontIdentifier, "143441");
 
@@ -139,13 +139,40 @@ TEST_F(SubscriptionManagerTest, TheHeaderFollowsTheBagTheProvidersAndTheProfile)
 TEST_F(SubscriptionManagerTest, AFailureOfTheProvidersLeavesTheMakersOwn)
 {
     EXPECT_EQ(factory->context().storeFrontIdentifier, "143459");
-    device.subscriptions.services = std::unexpected(platform::Error::posix(EIO));
+    device.subscriptions.services = {{"daily", Value::dictionaryOf({{"provider", "daily"}})}};
     bag(lists);
+    EXPECT_NE(header(), kFuseOnly);
+    device.subscriptions.services = std::unexpected(platform::Error::posix(EIO));
+    device.subscriptions.handler();
+    device.drain();
     EXPECT_EQ(header(), kFuseOnly);
     EXPECT_EQ(log.count("Error fetching third party subscription information from daemon: "), 1);
     device.notifications.post({.name = TAVBagChangeNotification, .userInfo = {{"bagError", platform::Error()}}});
     device.drain();
     EXPECT_EQ(header(), kFuseOnly);
+}
+
+TEST_F(SubscriptionManagerTest, TheHeaderHoldsWholeSubscriptionsUpToItsLimit)
+{
+    const std::string fuse = kFuseOnly;
+    const auto subscription = [](const char* provider, std::size_t size) {
+        return Value::dictionaryOf({{"provider", provider}, {"text", std::string(size, 'x')}});
+    };
+    const std::size_t rest = 4096 - fuse.size() - std::string(R"(,{"provider":"a","text":""})").size();
+    device.subscriptions.services = {{"a", subscription("a", rest)}};
+    bag(lists);
+    EXPECT_EQ(header().size(), 4096u);
+    EXPECT_EQ(log.count("is not sent"), 0);
+    device.subscriptions.services = {
+        {"a", subscription("a", 4090)}, {"b", subscription("b", 3000)}, {"c", subscription("c", 1)}};
+    device.subscriptions.handler();
+    device.drain();
+    EXPECT_EQ(log.count("subscription with \"a\" is not sent"), 1);
+    const auto sent = platform::parseJson(header()).value_or(Value());
+    EXPECT_EQ(sent.count(), 3u);
+    EXPECT_EQ(sent[0]["provider"], Value("fuse"));
+    EXPECT_EQ(sent[2]["provider"], Value("c"));
+    EXPECT_EQ(manager->subscriptions().size(), 4u);
 }
 
 } // namespace
