@@ -5,10 +5,13 @@
 #include <cstdlib>
 #include <map>
 #include <mutex>
+#include <set>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <expat.h>
 
+#include "platform/base/Date.h"
 #include "platform/base/Log.h"
 #include "platform/files/Files.h"
 #include "platform/files/FileWatch.h"
@@ -23,7 +26,9 @@ namespace {
 
 constexpr std::size_t kMaximumApplications = 10'000;
 constexpr int kMaximumDepth = 4;
-/// Folders: each takes one of the inotify instances of which a user has, by default, 128.
+constexpr std::size_t kMaximumFolders = 1'000; // below one data directory, as the next
+constexpr std::size_t kMaximumNames = 100'000;
+/// Each takes one of the inotify instances of which a user has, by default, 128.
 constexpr std::size_t kMaximumWatches = 32;
 constexpr std::size_t kMaximumEntrySize = 1u << 20;
 constexpr std::size_t kMaximumMetadataSize = 4u << 20;
@@ -94,38 +99,68 @@ std::string versionOf(FileSystem& files, const fs::path& dataDirectory, const st
     return "0";
 }
 
-/// The desktop entries below one folder, by file ID, and the folders themselves.
+/// What shows that entries came or went in a folder: the time of its last change alone is too coarse.
+struct FolderState {
+    std::int64_t changed = 0; ///< nanoseconds since 1970; 0 if there is no such folder
+    std::size_t names = 0;
+    bool operator==(const FolderState&) const = default;
+};
+using FolderStates = std::map<fs::path, FolderState>;
+
+/// The desktop entries below one folder by file ID, and the folders that were looked through.
+///
+/// Links to folders are followed, but every folder is looked through once, however many paths lead to it.
 struct EntryFolder {
     std::map<std::string, fs::path> entries;
-    std::vector<fs::path> folders;
+    FolderStates folders;
 
-    explicit EntryFolder(const fs::path& root) { walk(root, "", 1); }
+    explicit EntryFolder(const fs::path& root)
+    {
+        walk(root, "", 1);
+        if (folders.size() == kMaximumFolders || _names >= kMaximumNames)
+            defaultLog().error("not all of {} is looked through: {} folders, {} names", root.string(), folders.size(),
+                               _names);
+        folders.try_emplace(root); // it may come
+    }
 
 private:
     void walk(const fs::path& folder, const std::string& prefix, int depth)
     {
+        struct stat status{};
+        if (stat(folder.c_str(), &status) != 0 || folders.size() == kMaximumFolders) return;
+        if (!_seen.emplace(status.st_dev, status.st_ino).second) return;
         std::error_code error;
         fs::directory_iterator each(folder, error);
         if (error) return;
-        folders.push_back(folder);
-        for (; each != fs::directory_iterator(); each.increment(error)) {
-            if (error) return;
+        FolderState& state = folders[folder];
+        state.changed = dateFromSystemTime(status.st_ctim.tv_sec, status.st_ctim.tv_nsec).time_since_epoch().count();
+        // Folders before links to folders, so that the same path is taken whichever the file system lists first.
+        std::set<std::pair<bool, std::string>> inner;
+        for (; each != fs::directory_iterator() && _names < kMaximumNames; each.increment(error), ++_names) {
+            if (error) break;
+            ++state.names;
             const std::string name = each->path().filename();
             std::error_code ignored;
             if (name.ends_with(kSuffix)) {
                 if (entries.size() < kMaximumApplications)
                     entries.emplace(prefix + name.substr(0, name.size() - kSuffix.size()), each->path());
-            } else if (each->is_directory(ignored) && depth < kMaximumDepth) {
-                walk(each->path(), prefix + name + "-", depth + 1);
+            } else if (depth < kMaximumDepth && each->is_directory(ignored)) {
+                inner.emplace(each->is_symlink(ignored), name);
             }
         }
+        for (const auto& [isLink, name] : inner) walk(folder / name, prefix + name + "-", depth + 1);
     }
+
+    std::set<std::pair<dev_t, ino_t>> _seen;
+    std::size_t _names = 0;
 };
 
 class DesktopEntries final : public InstalledApplications {
 public:
-    DesktopEntries(FileSystem& files, std::vector<fs::path> dataDirectories, RunLoop& runLoop, Clock& clock)
-        : _files(files), _dataDirectories(std::move(dataDirectories)), _runLoop(runLoop), _clock(clock)
+    DesktopEntries(FileSystem& files, std::vector<fs::path> dataDirectories, RunLoop& runLoop, Executor& executor,
+                   Clock& clock)
+        : _files(files), _dataDirectories(std::move(dataDirectories)), _runLoop(runLoop), _executor(executor),
+          _clock(clock)
     {}
     ~DesktopEntries() override
     {
@@ -160,7 +195,8 @@ public:
         _handler = std::move(handler);
         if (std::exchange(_watching, true)) return;
         _runLoop.execute(Priority::Default, [this] {
-            afterSettling([this] { watchFolders(); }); // not now, for the start of the process isn't to wait for it
+            look(false);
+            afterSettling([this] { look(false); }); // watches are not made while the process starts
         });
     }
 
@@ -173,28 +209,66 @@ private:
         return result;
     }
 
-    void watchFolders()
+    /// Has a worker look through all folders. Afterwards tells the handler if `tell` or if they are not as they were.
+    void look(bool tell)
     {
+        _tell = _tell || tell;
+        if (std::exchange(_looking, true)) {
+            _lookAgain = true;
+            return;
+        }
+        _executor.execute(Priority::Background,
+                          [alive = std::weak_ptr(_alive), this, &runLoop = _runLoop, directories = _dataDirectories] {
+                              FolderStates folders;
+                              for (const fs::path& directory : directories)
+                                  folders.merge(EntryFolder(directory / "applications").folders);
+                              runLoop.execute(Priority::Default, [alive, this, folders = std::move(folders)]() mutable {
+                                  if (!alive.expired())
+                                      looked(std::move(folders)); // this is destroyed on the same thread
+                              });
+                          });
+    }
+
+    void looked(FolderStates folders)
+    {
+        _looking = false;
+        const bool first = !_folders;
+        const bool same = first || *_folders == folders;
+        _folders = std::move(folders);
+        const bool tell = std::exchange(_tell, false) || !same;
+        // What changed after the look and before its watches were made is found by another look.
+        if ((!first && watchFolders()) || std::exchange(_lookAgain, false)) look(false);
+        if (!tell) return;
+        std::function<void()> handler;
+        {
+            std::lock_guard lock(_mutex);
+            handler = _handler;
+        }
+        if (handler) handler();
+    }
+
+    /// Watches the known folders; returns true if one was not watched before.
+    bool watchFolders()
+    {
+        bool isNew = false;
         std::map<fs::path, std::unique_ptr<FileWatch>> watches;
-        for (const fs::path& directory : _dataDirectories) {
-            std::vector<fs::path> folders = EntryFolder(directory / "applications").folders;
-            if (folders.empty()) folders.push_back(directory / "applications");
-            for (const fs::path& folder : folders) {
-                if (watches.size() == kMaximumWatches) {
-                    defaultLog().error("of the folders of applications {} are watched", kMaximumWatches);
-                    break;
-                }
-                auto known = _watches.extract(folder);
-                watches[folder] = known ? std::move(known.mapped())
-                                        : std::make_unique<FileWatch>(_runLoop, folder / "", [this] { changed(); });
+        for (const auto& [folder, state] : *_folders) {
+            if (watches.size() == kMaximumWatches) {
+                defaultLog().error("of {} folders of applications, {} are watched", _folders->size(), kMaximumWatches);
+                break;
             }
+            auto known = _watches.extract(folder);
+            isNew = isNew || !known;
+            watches[folder] = known ? std::move(known.mapped())
+                                    : std::make_unique<FileWatch>(_runLoop, folder / "", [this] { changed(); });
         }
         _watches = std::move(watches);
+        return isNew;
     }
 
     void changed()
     {
-        if (!_settling) afterSettling([this] { settled(); });
+        if (!_settling) afterSettling([this] { look(true); });
     }
 
     template <class Job> void afterSettling(Job job)
@@ -207,26 +281,23 @@ private:
         });
     }
 
-    void settled()
-    {
-        watchFolders(); // some may have come
-        std::function<void()> handler;
-        {
-            std::lock_guard lock(_mutex);
-            handler = _handler;
-        }
-        if (handler) handler();
-    }
-
     FileSystem& _files;
     const std::vector<fs::path> _dataDirectories;
     RunLoop& _runLoop;
+    Executor& _executor;
     Clock& _clock;
     std::mutex _mutex;
-    std::function<void()> _handler;                          // under the mutex
-    bool _watching = false;                                  // under the mutex
-    std::map<fs::path, std::unique_ptr<FileWatch>> _watches; // loop's thread, like the next
-    std::optional<Clock::TimerId> _settling;                 // until changes are told, or first looked for
+    std::function<void()> _handler; // under the mutex, like the next
+    bool _watching = false;
+
+    // Run loop's thread
+    std::map<fs::path, std::unique_ptr<FileWatch>> _watches;
+    std::optional<Clock::TimerId> _settling; // until the next look
+    std::optional<FolderStates> _folders;    // as last seen
+    bool _looking = false;
+    bool _lookAgain = false;
+    bool _tell = false;
+    const std::shared_ptr<void> _alive = std::make_shared<int>();
 };
 
 /// What the XML parser has met so far.
@@ -269,10 +340,11 @@ std::optional<std::string> firstReleaseVersion(std::string_view metadata)
     return reader.version;
 }
 
-std::unique_ptr<InstalledApplications>
-makeInstalledApplications(FileSystem& files, std::vector<fs::path> dataDirectories, RunLoop& runLoop, Clock& clock)
+std::unique_ptr<InstalledApplications> makeInstalledApplications(FileSystem& files,
+                                                                 std::vector<fs::path> dataDirectories,
+                                                                 RunLoop& runLoop, Executor& executor, Clock& clock)
 {
-    return std::make_unique<DesktopEntries>(files, std::move(dataDirectories), runLoop, clock);
+    return std::make_unique<DesktopEntries>(files, std::move(dataDirectories), runLoop, executor, clock);
 }
 
 } // namespace platform

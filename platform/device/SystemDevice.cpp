@@ -78,7 +78,7 @@ struct SystemDevice::Impl {
           counters(*files, directories.state / names.service / "counters.json", storeQueue),
           locale(makeLocaleSource(runLoop)), location(makeGeoClueLocationSource(runLoop, names.service)),
           profile(makeDeviceProfileSource(*files, directories.config / names.service / "device.json", runLoop)),
-          applications(makeInstalledApplications(*files, dataDirectories(directories), runLoop, *clock)),
+          applications(makeInstalledApplications(*files, dataDirectories(directories), runLoop, pool, *clock)),
           subscriptions(makeSubscriptionServices(*files, directories.config / names.service / "subscriptions.d",
                                                  runLoop, *clock)),
           dataDetectors(makeDataDetectorStore(*files, directories.data / names.service / "data-detectors")),

@@ -6,6 +6,7 @@
 #include "platform/files/Files.h"
 #include "platform/run/RunLoop.h"
 #include "tests/support/ManualClock.h"
+#include "tests/support/ManualExecutor.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace platform {
@@ -73,7 +74,7 @@ struct InstalledApplicationsTest : testing::Test {
 
     std::unique_ptr<InstalledApplications> make()
     {
-        return makeInstalledApplications(*files, {home.path, system.path, missing}, loop, clock);
+        return makeInstalledApplications(*files, {home.path, system.path, missing}, loop, executor, clock);
     }
     static void add(const test::TemporaryDirectory& directory, const fs::path& path, std::string_view contents)
     {
@@ -85,6 +86,7 @@ struct InstalledApplicationsTest : testing::Test {
     fs::path missing = home / "no/such/directory";
     std::unique_ptr<FileSystem> files = makeSystemFiles();
     RunLoop loop;
+    test::ManualExecutor executor; // the worker
     test::ManualClock clock;
 };
 
@@ -111,42 +113,59 @@ TEST_F(InstalledApplicationsTest, TheFirstDirectoryWinsAndBrokenEntriesAreLeftOu
                   {"kde-konsole", "0"}, {"linked", "0"}, {"old", "0.9"}, {"org.example.Mail", "4.2"}}));
 }
 
+TEST_F(InstalledApplicationsTest, EveryFolderIsLookedThroughOnce)
+{
+    add(system, "applications/kde/konsole.desktop", kEntry);
+    add(system, "elsewhere/linked.desktop", kEntry);
+    for (int i = 0; i < 60; ++i) fs::create_directory_symlink(".", system / fmt::format("applications/self{}", i));
+    fs::create_directory_symlink("kde", system / "applications/again");
+    fs::create_directory_symlink("..", system / "applications/kde/up");
+    fs::create_directory_symlink("../elsewhere", system / "applications/other");
+    EXPECT_EQ(make()->applications(), (std::vector<InstalledApplication>{{"kde-konsole", "0"}, {"other-linked", "0"}}));
+}
+
 TEST_F(InstalledApplicationsTest, ChangesAreToldOnceTheyHaveSettledAlsoInFoldersThatCome)
 {
     int told = 0;
     const auto applications = make();
+    const auto turn = [&] {
+        for (int i = 0; i < 5; ++i) {
+            loop.runOnce(Duration::zero());
+            executor.drain();
+        }
+    };
     applications->onChange([&] { ++told; });
-    loop.runOnce(Duration::zero());
+    turn();
+    add(home, "applications/zero.desktop", kEntry);
     clock.advance(std::chrono::seconds(2), [] {});
-    loop.runOnce(std::chrono::seconds(1)); // the watches are there now
+    for (int i = 0; i < 5; ++i) loop.runOnce(Duration::zero());
+    EXPECT_EQ(told, 0) << "it is the worker that looks";
+    turn();
+    EXPECT_EQ(told, 1) << "what came before the watches";
+
     const auto settle = [&] {
         EXPECT_TRUE(test::runUntil(loop, [&] { return clock.pendingTimers() > 0; }));
-        for (int i = 0; i < 5; ++i) loop.runOnce(Duration::zero()); // the same change, seen in other folders
+        turn(); // the same change, seen in other folders
         const int before = told;
         clock.advance(std::chrono::milliseconds(1999), [] {});
-        loop.runOnce(Duration::zero());
+        turn();
         EXPECT_EQ(told, before);
         clock.advance(std::chrono::milliseconds(1), [] {});
-        loop.runOnce(std::chrono::seconds(1));
+        turn();
+        EXPECT_EQ(told, before + 1);
+        EXPECT_EQ(clock.pendingTimers(), 0u);
     };
-
     add(home, "applications/one.desktop", kEntry);
     settle();
-    EXPECT_EQ(told, 1) << "the folder and its entry";
-    EXPECT_EQ(clock.pendingTimers(), 0u);
     fs::create_directories(home / "applications/wine");
     settle();
-    EXPECT_EQ(told, 2);
     add(home, "applications/wine/two.desktop", kEntry);
     settle();
-    EXPECT_EQ(told, 3);
     fs::rename(home / "applications", home / "away");
     settle();
-    EXPECT_EQ(told, 4);
     EXPECT_TRUE(applications->applications().empty());
     add(home, "unrelated", "");
-    loop.runOnce(Duration::zero());
-    loop.runOnce(Duration::zero());
+    turn();
     EXPECT_EQ(clock.pendingTimers(), 0u);
 }
 
