@@ -7,11 +7,11 @@
 
 namespace tavrin {
 
-/// Objects under texts, in order of the texts' bytes; finds all texts that begin with a prefix. A text that holds a NUL
-/// can't be a key: it is never found and not stored.
+/// Maps texts to objects, in the order of the texts' bytes, and finds all texts that begin with a prefix. A text that
+/// holds a NUL can't be a key: it is neither stored nor found.
 ///
-/// The tree owns no object and releases none: whoever fills it keeps the objects alive until they can't be found any
-/// more. Not thread-safe.
+/// The tree owns no object and releases none: its user keeps every object alive until it can't be found any more. Not
+/// thread-safe.
 template <class Object> class CritbitTree {
 public:
     CritbitTree()
@@ -22,9 +22,10 @@ public:
     CritbitTree(const CritbitTree&) = delete;
     CritbitTree& operator=(const CritbitTree&) = delete;
 
-    /// Stores the object in place of what is under the key. False: it is there already, or wasn't stored.
+    /// Stores the object, replacing any other under the key. Returns false if nothing changed: the key has this object
+    /// already, or the object could not be stored.
     bool setObject(Object& object, std::string_view key) { return critbit_insert(_tree, key, pointer(object), 1) != 0; }
-    /// Null where there is none.
+    /// Returns null if the key is absent.
     [[nodiscard]] Object* objectForKey(std::string_view key) const
     {
         void* object = nullptr;
@@ -35,8 +36,8 @@ public:
     void removeAllObjects() { critbit_clear(_tree); }
     [[nodiscard]] std::uint64_t count() const { return _tree.count; }
 
-    /// Calls `block(std::string_view key, Object& object, bool& stop)` for each key that begins with the prefix, in
-    /// order, until it sets `stop`. The key is valid during the call only; the block must not change the tree.
+    /// Calls `block(std::string_view key, Object& object, bool& stop)` for every key that begins with the prefix, in
+    /// order, until it sets `stop`. The key is valid during the call only. The block must not change the tree.
     template <class Block> void keysMatchingPrefix(std::string_view prefix, Block block) const
     {
         const auto callback = [](const char* key, void* context) {

@@ -16,15 +16,15 @@ namespace {
 
 using Link = std::uintptr_t; // the address of an Internal plus 1, or that of an External
 
-/// Parts the keys in which one bit differs: those without it are under child 0.
+/// Separates keys by one bit: those without it are under child 0.
 struct Internal {
     Link child[2];
-    std::uint32_t byte;     // the first in which the keys under the two children differ
-    std::uint8_t otherBits; // all bits but the highest that differs there
+    std::uint32_t byte;     // index of the first byte in which the keys of the two subtrees differ
+    std::uint8_t otherBits; // all bits except the highest differing one
 
-    /// Where a key belongs whose byte at our position is `c`.
+    /// The child for a key whose byte at `byte` is `c`.
     [[nodiscard]] int direction(unsigned char c) const { return (1 + (otherBits | c)) >> 8; }
-    /// A key that ends before our position has a NUL there.
+    /// A key that ends before `byte` has a NUL there.
     [[nodiscard]] int direction(std::string_view key) const
     {
         return direction(byte < key.size() ? static_cast<unsigned char>(key[byte]) : 0);
@@ -65,9 +65,14 @@ External& bestLeaf(Link link, std::string_view key)
     return external(link);
 }
 
-External* makeLeaf(std::string_view key, void* value)
+void* allocate(const critbit_tree& tree, std::size_t size)
 {
-    void* memory = std::malloc(sizeof(External) + key.size() + 1);
+    return tree.allocate ? tree.allocate(size) : std::malloc(size);
+}
+
+External* makeLeaf(const critbit_tree& tree, std::string_view key, void* value)
+{
+    void* memory = allocate(tree, sizeof(External) + key.size() + 1);
     if (!memory) return nullptr;
     auto* leaf = new (memory) External{value};
     std::memcpy(leaf->key(), key.data(), key.size());
@@ -97,7 +102,7 @@ int critbit_insert(critbit_tree& tree, std::string_view key, void* value, int re
 {
     if (key.contains('\0') || key.size() >= std::numeric_limits<std::uint32_t>::max()) return 0;
     if (!tree.root) {
-        External* leaf = makeLeaf(key, value);
+        External* leaf = makeLeaf(tree, key, value);
         if (!leaf) return 0;
         tree.root = reinterpret_cast<Link>(leaf);
         tree.count = 1;
@@ -118,9 +123,9 @@ int critbit_insert(critbit_tree& tree, std::string_view key, void* value, int re
         return 1;
     }
 
-    auto* node = static_cast<Internal*>(std::malloc(sizeof(Internal)));
+    auto* node = static_cast<Internal*>(allocate(tree, sizeof(Internal)));
     if (!node) return 0;
-    External* leaf = makeLeaf(key, value);
+    External* leaf = makeLeaf(tree, key, value);
     if (!leaf) {
         std::free(node);
         return 0;

@@ -1,3 +1,4 @@
+#include <cstdlib>
 #include <pthread.h>
 #include <random>
 
@@ -26,6 +27,28 @@ TEST(Critbit, InsertTellsWhatItDid)
     void* held = nullptr;
     EXPECT_EQ(critbit_contains(model.tree, "a", &held), 1);
     EXPECT_EQ(held, value(2)) << "only the lowest bit of the flag counts";
+}
+
+int allocationsLeft = 0;
+
+TEST(Critbit, WithoutMemoryNothingChanges)
+{
+    critbit_tree tree;
+    tree.allocate = [](std::size_t size) { return allocationsLeft-- > 0 ? std::malloc(size) : nullptr; };
+    EXPECT_EQ(critbit_insert(tree, "a", value(1), 1), 0);
+    EXPECT_EQ(tree.root, 0u);
+    allocationsLeft = 1;
+    EXPECT_EQ(critbit_insert(tree, "a", value(1), 1), 2);
+    for (const int left : {0, 1}) { // for the node, for the leaf
+        allocationsLeft = left;
+        EXPECT_EQ(critbit_insert(tree, "ab", value(2), 1), 0) << left;
+        EXPECT_EQ(critbit_contains(tree, "ab", nullptr), 0) << left;
+        EXPECT_EQ(critbit_contains(tree, "a", nullptr), 1) << left;
+        EXPECT_EQ(tree.count, 1u) << left;
+    }
+    allocationsLeft = 2;
+    EXPECT_EQ(critbit_insert(tree, "ab", value(2), 1), 2);
+    critbit_clear(tree);
 }
 
 TEST(Critbit, FindsWhatBeginsWithAPrefixInOrder)
