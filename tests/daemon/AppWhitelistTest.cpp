@@ -11,11 +11,11 @@
 #include "CoreTavrin/TAVBag.h"
 #include "platform/values/Json.h"
 #include "tavrind/AppWhitelistController.h"
-#include "tavrind/Assembly.h"
 #include "tavrind/decoder.h"
 #include "tavrind/DownloadManager.h"
 #include "tavrind/encoder.h"
 #include "tavrind/mmap_file.h"
+#include "tests/support/DaemonFixture.h"
 #include "tests/support/TemporaryDirectory.h"
 #include "tests/support/TestDevice.h"
 
@@ -214,38 +214,73 @@ TEST(AppWhitelist, GivesNoSignatureForWhatIsNoListOrNamesNothingInstalled)
     EXPECT_EQ(device.applications.readings, 0) << "for nothing";
 }
 
-struct AppWhitelistControllerTest : testing::Test {
-    std::shared_ptr<AppWhitelistController> make()
+struct AppWhitelistControllerTest : test::DaemonTest {
+    static constexpr const char* kKey = "TAVAppWhitelistSignature";
+    const std::string resource = "/caches/com.quorvane.tavrind/TAVInstalledAppWhitelist";
+    const std::string list =
+        listOf(R"({"version": "0a1b2c", "apps": {"one": [{"encoding_id": 1}], "three": [{"encoding_id": 3}]}})");
+
+    std::string signature() { return assembly().appWhitelistController->whitelistSignature(); }
+    void changeApplications(const std::vector<std::string>& names)
     {
-        assembly.downloadManager = std::make_shared<DownloadManager>(assembly);
-        auto controller = AppWhitelistController::make(assembly);
+        device.applications.installed.clear();
+        for (const std::string& name : names) device.applications.installed.push_back({name, "0"});
+        device.applications.handler();
         device.drain();
-        return controller;
     }
-    platform::test::TestDevice device;
     platform::test::LogCapture log;
-    Assembly assembly{device.device};
 };
 
-TEST_F(AppWhitelistControllerTest, AStoredSignatureIsUsedUntilApplicationsChangeAndThenGoesWithItsReason)
+TEST_F(AppWhitelistControllerTest, InstalledApplicationsOfTheListBecomeAHeaderThatOutlivesTheDaemon)
 {
-    device.userDefaults.set("TAVAppWhitelistSignature", "c3RvcmVk");
-    const auto controller = make();
-    EXPECT_EQ(controller->whitelistSignature(), "c3RvcmVk");
-    EXPECT_EQ(log.count("generating app whitelist"), 0);
+    device.files.files[resource] = list;
+    for (const char* other : {"TAVVistrelModels", "TAVLookupHintsWeekly"})
+        device.files.files["/caches/com.quorvane.tavrind/" + std::string(other)] = "another resource";
+    start();
+    EXPECT_EQ(log.count("generating app whitelist"), 1) << "nothing is stored";
+    EXPECT_EQ(signature(), "");
 
-    device.applications.handler();
-    device.drain();
+    changeApplications({"one", "unlisted"});
+    EXPECT_EQ(signature(), *signatureOf({1}));
+    changeApplications({"one", "three"});
+    EXPECT_EQ(device.userDefaults.value(kKey), Value(*signatureOf({1, 3})));
+    start();
+    EXPECT_EQ(log.count("generating app whitelist"), 3) << "the stored one is used";
+    auto connection = client();
+    deliverBag();
+    search(*connection, 1, "weather");
+    const std::string* header = lastTask()->originalRequest().headers.find("X-Quorvane-Whitelisted-App-Signature");
+    EXPECT_EQ(header ? *header : "", *signatureOf({1, 3}));
+
+    device.files.files[resource] = "no list";
+    changeApplications({"one"});
+    EXPECT_EQ(signature(), "");
+    EXPECT_TRUE(device.userDefaults.value(kKey).isNull());
+    device.files.files.erase(resource);
+    device.userDefaults.set(kKey, "c3RvcmVk");
+    changeApplications({"one"});
     EXPECT_EQ(log.count("error reading app whitelist"), 1);
-    EXPECT_EQ(controller->whitelistSignature(), "");
-    EXPECT_TRUE(device.userDefaults.value("TAVAppWhitelistSignature").isNull());
+    EXPECT_TRUE(device.userDefaults.value(kKey).isNull());
 }
 
-TEST_F(AppWhitelistControllerTest, ComputesAtOnceWhereNothingIsStored)
+TEST_F(AppWhitelistControllerTest, OneComputationRunsAtATime)
 {
-    const auto controller = make();
-    EXPECT_EQ(log.count("generating app whitelist"), 1);
-    EXPECT_EQ(device.applications.readings, 0) << "there is no list to read them for";
+    device.userDefaults.set(kKey, "c3RvcmVk");
+    device.files.files[resource] = list;
+    start();
+    device.applications.onReading = [&] {
+        if (device.applications.readings > 1) return;
+        device.applications.handler();
+        device.drain(); // another worker takes it up
+        EXPECT_EQ(log.count("generating app whitelist"), 1);
+        EXPECT_EQ(signature(), "c3RvcmVk") << "until the new one is there";
+    };
+    changeApplications({"one"});
+    EXPECT_EQ(device.applications.readings, 1);
+    EXPECT_EQ(signature(), *signatureOf({1}));
+    changeApplications({});
+    EXPECT_EQ(device.applications.readings, 2) << "the next change counts again";
+    EXPECT_EQ(signature(), "");
 }
 
 TEST(MappedFile, OutlivesItsHandleAndAnEmptyOneIsAnError)

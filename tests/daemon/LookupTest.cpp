@@ -58,12 +58,16 @@ TEST_F(LookupTest, HintsAreInstalledWhenTheyComeAndGoWithTheirResource)
     deliver("models", "https://r.example/f");
     EXPECT_EQ(log.count("sourceKind: 2"), 1) << "taken away at first";
 
-    device.notifications.post({.name = TAVFileDownloadCompletedNotification,
-                               .userInfo = {{"identifier", std::string("TAVLookupHintsWeekly")},
-                                            {"url", std::filesystem::path("/not/there")}}});
-    device.drain();
+    device.files.files["/weeks"] = "weeks";
+    for (const char* path : {"/weeks", "/not/there"}) {
+        device.notifications.post(
+            {.name = TAVFileDownloadCompletedNotification,
+             .userInfo = {{"identifier", std::string("TAVLookupHintsWeekly")}, {"url", std::filesystem::path(path)}}});
+        device.drain();
+        EXPECT_EQ(installed(Lookup::Weekly).starts_with("weeks"), path == std::string("/weeks")) << path;
+    }
     EXPECT_EQ(log.count("error trying to open hints file"), 1);
-    EXPECT_EQ(installed(Lookup::Weekly), "- -");
+    EXPECT_EQ(installed(Lookup::Weekly), "- -") << "an unreadable file stands for none";
 }
 
 TEST_F(LookupTest, StartupInstallsOnlyWhatTheStoreDoesNotHave)

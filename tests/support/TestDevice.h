@@ -76,10 +76,12 @@ struct FakeProfile final : DeviceProfileSource {
 struct FakeApplications final : InstalledApplications {
     std::vector<InstalledApplication> installed;
     int readings = 0;
+    std::function<void()> onReading; ///< what happens meanwhile
     std::function<void()> handler;
     std::vector<InstalledApplication> applications() override
     {
         ++readings;
+        if (onReading) onReading();
         return installed;
     }
     void onChange(std::function<void()> newHandler) override { handler = std::move(newHandler); }
