@@ -7,15 +7,15 @@
 
 namespace platform {
 
-/// A run of bytes that nobody changes any more: a response body, a mapped file, an upload.
+/// An immutable run of bytes: a response body, a mapped file, an upload.
 ///
-/// Copies share the bytes and their owner (a string, a mapping, a slice of a larger run); the last copy
-/// releases them. Immutable, hence any thread.
+/// Copies and slices share the bytes and their owner (a string, a mapping), which the last of them releases. Any
+/// thread.
 class Bytes {
 public:
     Bytes() = default;
 
-    /// Takes the string's contents over.
+    /// Takes over the string's contents.
     explicit Bytes(std::string contents)
     {
         auto owned = std::make_shared<const std::string>(std::move(contents));
@@ -23,7 +23,7 @@ public:
         _owner = std::move(owned);
     }
 
-    /// Bytes at `view`, kept alive by `owner`.
+    /// Refers to the bytes at `view`, which `owner` keeps alive.
     Bytes(std::shared_ptr<const void> owner, std::string_view view) : _owner(std::move(owner)), _view(view) {}
 
     [[nodiscard]] std::string_view view() const { return _view; }
@@ -31,7 +31,7 @@ public:
     [[nodiscard]] std::size_t size() const { return _view.size(); }
     [[nodiscard]] bool empty() const { return _view.empty(); }
 
-    /// A part of these bytes that shares their owner. `offset` must not lie past the end.
+    /// Returns at most `count` bytes from `offset` on, which must not lie past the end.
     [[nodiscard]] Bytes slice(std::size_t offset, std::size_t count = std::string_view::npos) const
     {
         return {_owner, _view.substr(offset, count)};

@@ -2,19 +2,22 @@
 
 namespace platform {
 
-/// An open file descriptor that closes itself. Movable; the holder may hand it to another thread.
+/// Owns an open file descriptor, or none, and closes it on destruction. One thread at a time.
 class FileHandle {
 public:
     FileHandle() = default;
+    /// Takes over `fd`; a negative number means none.
     explicit FileHandle(int fd) : _fd(fd) {}
     FileHandle(FileHandle&& other) noexcept : _fd(other.release()) {}
     FileHandle& operator=(FileHandle&& other) noexcept;
     ~FileHandle();
+    /// The descriptor, still owned by this handle; negative for none.
     [[nodiscard]] int fd() const { return _fd; }
     [[nodiscard]] explicit operator bool() const { return _fd >= 0; }
-    /// Gives the descriptor up; the caller closes it.
+    /// Returns the descriptor, which the caller now owns.
     int release();
-    /// Another descriptor of the same open file; none where the process has too many, or where this is none.
+    /// Returns another descriptor of the same open file (offset and flags are shared); none if the process has too many
+    /// descriptors or this handle has none.
     [[nodiscard]] FileHandle duplicate() const;
 
 private:

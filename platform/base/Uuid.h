@@ -9,7 +9,7 @@
 
 namespace platform {
 
-/// A 128-bit identifier (RFC 4122). The default is all zero, `isNil()`.
+/// A 128-bit identifier (RFC 4122); nil, all zero, by default.
 class Uuid {
 public:
     Uuid() = default;
@@ -18,10 +18,10 @@ public:
     /// A fresh random UUID (version 4) from the cryptographic generator. Any thread.
     [[nodiscard]] static Uuid random();
 
-    /// Reads the 36-character text form in either case; nothing for any other text.
+    /// Reads the 36-character text form in either case; returns nothing for any other text.
     [[nodiscard]] static std::optional<Uuid> parse(std::string_view text);
 
-    /// The 36-character text form, in capitals.
+    /// Returns the 36-character text form in capitals.
     [[nodiscard]] std::string string() const;
 
     [[nodiscard]] bool isNil() const { return _bytes == std::array<std::uint8_t, 16>{}; }

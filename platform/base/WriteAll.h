@@ -4,8 +4,8 @@
 
 namespace platform {
 
-/// Writes all of it to the descriptor, in as many calls as it takes; false, with errno, at the first that fails. It
-/// waits where writing does. Any thread.
+/// Writes all contents to the descriptor, in as many calls as that takes, and blocks if they block. Returns false, with
+/// errno set, if one fails; part of the contents may be written then. Any thread.
 [[nodiscard]] bool writeAll(int fd, std::string_view contents);
 
 } // namespace platform

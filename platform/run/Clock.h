@@ -11,6 +11,8 @@ namespace platform {
 ///
 /// wallNow() follows the system clock and jumps with it. hostTicks() counts nanoseconds of being awake: it stops
 /// in suspend and no clock change moves it. after() counts on hostTicks(). Any thread.
+///
+/// What must outlast a restart or a suspend counts in `LivedTime`.
 class Clock {
 public:
     virtual ~Clock() = default;
@@ -18,14 +20,14 @@ public:
     [[nodiscard]] virtual Date wallNow() const = 0;
     [[nodiscard]] virtual std::uint64_t hostTicks() const = 0;
 
-    /// Identifies a pending timer; 0 is none.
+    /// Identifies a pending timer; never 0.
     using TimerId = std::uint64_t;
 
-    /// Calls `fire` once, `delay` from now (a delay of zero or less: as soon as possible). It is called on the
-    /// clock's own thread, so it must only hand work on: services use `Queue::after`.
+    /// Calls `fire` once, `delay` from now; as soon as possible if that is zero or less, but not inside this call.
+    /// `fire` runs on the clock's own thread and must only hand work on: services use `Queue::after`.
     virtual TimerId after(Duration delay, std::move_only_function<void()> fire) = 0;
 
-    /// Forgets a pending timer and destroys its callback; false if it has fired or is firing.
+    /// Forgets a pending timer and destroys its callback. Returns false if it has fired or is firing.
     virtual bool cancel(TimerId timer) = 0;
 };
 

@@ -9,28 +9,28 @@ namespace platform {
 
 class Clock;
 
-/// How much time has passed between two looks at the clock, by what the system clock says and by what the host ticks
-/// say.
+/// Returns how much time has passed between two readings of the clock, given the differences of its two counts.
 ///
-/// The ticks are the least: a system clock that was set back counts for nothing. What the system clock says beyond them
-/// is time in which the device was suspended or the process wasn't there, up to a year; more is a clock that was set.
+/// At least the host ticks have passed: a system clock that was set back is ignored. What the system clock shows beyond
+/// them counts as suspend or as absence of the process if it is up to a year; more means that the clock was set.
 [[nodiscard]] Duration timePassed(Duration bySystemClock, Duration byHostTicks);
 
-/// A count of time that goes on through suspend and while no process runs, and that leaps of the system clock don't
-/// touch: for deadlines and due times that are kept on disk. It never goes back. One thread at a time.
+/// A count of time for deadlines and due times that are kept on disk: it goes on through suspend and while no process
+/// runs, ignores leaps of the system clock, and never goes back. One thread at a time; the clock must outlive it.
 class LivedTime {
 public:
-    /// What is kept on disk: the count, and the system clock when it stood there.
+    /// What is kept on disk: a count, and the system clock at that moment.
     struct Mark {
         Duration lived{};
         Date wall;
     };
 
-    /// Goes on from `saved`, or begins at 0.
+    /// Continues from `saved`, which may come from a damaged file, or begins at 0.
     explicit LivedTime(Clock& clock, std::optional<Mark> saved = std::nullopt);
 
+    /// Returns the count.
     [[nodiscard]] Duration now();
-    /// Where the count stands.
+    /// Returns the count and the system clock, to be saved.
     [[nodiscard]] Mark mark();
 
 private:

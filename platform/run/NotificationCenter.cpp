@@ -11,8 +11,8 @@ struct NotificationCenter::Token::Observer {
     Callback callback;
     const void* sender;
     std::weak_ptr<State> state;
-    /// Held while the callback runs, so that a destroyed token's callback has returned; recursive, so that it may be
-    /// destroyed there.
+    /// Held while the callback runs, so that the token's destructor waits for it; recursive, so that the callback may
+    /// destroy its own token.
     std::recursive_mutex running;
     bool removed = false; // under `running`
 };

@@ -9,13 +9,13 @@
 
 namespace platform {
 
-/// Something that happened, told to whoever observes its name.
+/// Something that happened, by name.
 struct Notification {
     std::string name;
-    const void* object = nullptr; ///< the sender, for observers that listen to one sender only
+    const void* object = nullptr; ///< the sender; compared only, never dereferenced
     std::map<std::string, std::any, std::less<>> userInfo;
 
-    /// The entry under `key` if it is a `T`, else a default `T` (null, for pointers).
+    /// Returns the entry under `key` if it is exactly a `T`, else a default `T` (null for pointers).
     template <class T> [[nodiscard]] T get(std::string_view key) const
     {
         auto found = userInfo.find(key);
@@ -27,10 +27,9 @@ struct Notification {
 
 /// In-process notifications. Any thread.
 ///
-/// `post` calls the observers on the posting thread, in the order in which they registered, from a snapshot and
-/// without a lock: observers may register, unregister and post. Once a token's destruction has returned, its
-/// callback is neither running on another thread nor called again; a token may be destroyed inside its own
-/// callback.
+/// `post` calls the observers on the posting thread, in the order of their registration, from a snapshot and without
+/// holding a lock: observers may register, unregister and post. Once a token's destructor has returned, its callback is
+/// neither running on another thread nor called again. A token may be destroyed inside its own callback.
 class NotificationCenter {
 public:
     using Callback = std::function<void(const Notification&)>;
@@ -53,9 +52,11 @@ public:
     NotificationCenter();
     ~NotificationCenter();
 
-    /// Observes `name`; with a sender, only that sender's. The centre may go before the token.
+    /// Calls `callback` for every notification `name`; only for those of `sender` unless that is null. The token may
+    /// outlive the centre.
     [[nodiscard]] Token observe(std::string_view name, Callback callback, const void* sender = nullptr);
 
+    /// Returns when all observers have been called.
     void post(const Notification& notification) const;
 
 private:

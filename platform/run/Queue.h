@@ -13,8 +13,7 @@ namespace platform {
 
 class Clock;
 
-/// A happening that several may wait for; see `Queue::suspendUntil`. It fires once, and from then on has happened.
-/// Any thread.
+/// Something that happens once, for which several queues may wait (`Queue::suspendUntil`). Any thread.
 class Event {
 public:
     Event();
@@ -22,7 +21,7 @@ public:
     Event(const Event&) = delete;
     Event& operator=(const Event&) = delete;
 
-    /// Wakes everyone who waits now and lets everyone who comes later through. Further calls do nothing.
+    /// Wakes all who wait; from now on nobody waits. Further calls do nothing.
     void signal();
     [[nodiscard]] bool signalled() const;
 
@@ -32,20 +31,20 @@ private:
     std::shared_ptr<State> _state;
 };
 
-/// The one way to guard state: tasks of a serial queue run one at a time, in order.
+/// Guards state: whatever only tasks of one queue touch needs no lock.
 ///
-/// A serial queue runs its tasks in the order in which they came. A concurrent queue runs shared tasks (`async`,
-/// `sync`) side by side and barrier tasks (`barrierAsync`, `barrierSync`) alone, in order with what came before
-/// and after; on a serial queue barrier and plain calls are the same.
+/// A serial queue runs its tasks one at a time, in the order of the calls. A concurrent queue runs shared tasks
+/// (`async`, `sync`) side by side and barrier tasks (`barrierAsync`, `barrierSync`) alone, after all earlier and before
+/// all later tasks. On a serial queue the barrier calls are the plain ones.
 ///
-/// `sync` on an idle queue runs inline on the caller. A caller that finds tasks waiting but nobody draining
-/// drains up to its own turn and no further, so it never depends on a free worker. `sync` on a queue that the
-/// thread is already on can never return: it aborts with the label.
+/// `sync` on an idle queue runs inline on the caller's thread. If tasks are waiting and no thread drains them, the
+/// caller drains up to its own turn and no further, so that it never depends on a free worker. `sync` on a queue that
+/// the thread is already on could never return: it aborts with the label.
 ///
-/// No task waits: a task that must wait for something calls `suspendUntil`, which holds back the queue's later
-/// tasks and no thread. `async` work is drained in batches, so one busy queue cannot hold a worker for ever.
+/// No task waits. A task that must wait for something calls `suspendUntil`, which holds back the queue's later tasks
+/// but no thread. Asynchronous tasks run in batches on the executor, so that no busy queue holds a worker for ever.
 ///
-/// Queues are shared: pending tasks keep theirs alive. Any thread.
+/// Pending tasks keep their queue alive. Any thread.
 class Queue : public std::enable_shared_from_this<Queue> {
 public:
     using Task = std::move_only_function<void()>;
@@ -63,27 +62,27 @@ public:
     void async(Task task);
     void barrierAsync(Task task);
 
-    /// Runs `function` in turn and answers its result.
+    /// Returns what `function` returns, once its turn has come and it has run.
     template <class F> auto sync(F&& function) { return runNow(std::forward<F>(function), false); }
     template <class F> auto barrierSync(F&& function) { return runNow(std::forward<F>(function), true); }
 
-    /// Queues the task once `delay` has passed on the clock's hostTicks().
+    /// Appends the task once `delay` has passed, counted on the clock's hostTicks(). The timer keeps the queue alive.
     void after(Duration delay, Task task);
 
-    /// From a task of this (serial) queue: once that task has returned, holds back everything queued behind it
-    /// until `event` has happened or `timeout` has passed, then runs `continuation` ahead of what was held back.
-    /// The continuation may call suspendUntil again. Where the event has happened already, the continuation is
-    /// next in turn. A task that calls it more than once has its continuations run in that order, when all may.
+    /// To be called from a task of this queue, which must be serial. Once that task has returned, holds back all later
+    /// tasks until `event` has happened or `timeout` has passed, then runs `continuation` before them; if the event has
+    /// happened already, at once. The continuation may call suspendUntil again. If one task calls it several times, the
+    /// continuations run in the order of the calls, when all of them may.
     void suspendUntil(const Event& event, Duration timeout, Task continuation);
 
-    /// The innermost queue whose task this thread runs; null outside any.
+    /// Returns the innermost queue of which this thread runs a task, or null.
     [[nodiscard]] static std::shared_ptr<Queue> current();
-    /// True while this thread runs a task of this queue.
+    /// Returns true if this thread runs a task of this queue.
     [[nodiscard]] bool isCurrent() const;
     /// Aborts with the label unless this thread runs a task of this queue.
     void assertOnQueue() const;
 
-    /// A non-owning reference to a callable, alive for the call only.
+    /// A reference to a callable that lives as long as the call.
     class TaskRef {
     public:
         template <class F>

@@ -9,43 +9,43 @@ struct sd_event;
 
 namespace platform {
 
-/// The main thread's event loop, on sd-event: descriptors, signals, and jobs handed in from other threads.
+/// The main thread's event loop, on sd-event: descriptors, signals, and jobs from other threads.
 ///
-/// `run`, `watch`, `onSignal` and the callbacks belong to the loop's thread; `execute` and `stop` may be called from
-/// any thread. An idle loop sleeps in the kernel: it has no tick.
+/// The loop's thread is the one that calls `run` or `runOnce`. Everything belongs to it, callbacks included, except
+/// `execute` and `stop`, which any thread may call. Nothing on it may block. An idle loop sleeps in the kernel: it has
+/// no tick. Aborts if the process can have no epoll descriptor.
 class RunLoop final : public Executor {
 public:
     RunLoop();
     ~RunLoop() override;
 
-    /// Runs until `stop()`.
+    /// Returns after `stop()`.
     void run();
-    /// Dispatches what is ready, waiting at most `timeout` for the first thing. For tests and tools.
+    /// Dispatches what is ready, and waits at most `timeout` if nothing is. For tests and tools.
     void runOnce(Duration timeout);
     void stop();
 
-    /// Runs the job on the loop's thread, after those handed in before it. The priority is not looked at.
+    /// Runs the job on the loop's thread, never inside this call, in the order of the calls. Ignores the priority.
     void execute(Priority priority, Job job) override;
 
-    /// Calls `handler` on the loop for SIGINT, SIGTERM and the like. The signal must be blocked already
-    /// (`blockSignals`).
+    /// Calls `handler` for every such signal, which must be blocked in all threads (`blockSignals`).
     void onSignal(int signal, std::move_only_function<void()> handler);
 
-    /// A watched descriptor; destroying it ends the watch.
+    /// A watched descriptor. Its destructor ends the watch; the descriptor stays the caller's.
     class Watch {
     public:
         virtual ~Watch() = default;
-        /// EPOLLIN, EPOLLOUT … to wait for; 0 pauses.
+        /// Sets the events (EPOLLIN, EPOLLOUT …) to wait for; 0 pauses the watch.
         virtual void setEvents(std::uint32_t events) = 0;
     };
-    /// Calls `ready` with the events seen on `fd` (level-triggered).
+    /// Calls `ready` with the events seen on `fd`, level-triggered. `fd` must stay open as long as the watch.
     [[nodiscard]] std::unique_ptr<Watch> watch(int fd, std::uint32_t events, std::function<void(std::uint32_t)> ready);
 
-    /// The loop underneath, for the libraries that can share it. Loop's thread.
+    /// The loop itself, for libraries that can share it. Owned by this object.
     [[nodiscard]] sd_event* handle() const;
 
-    /// Blocks SIGINT and SIGTERM for this thread and every thread made from it, and ignores SIGPIPE: a peer that went
-    /// is an error of the write. Call before the first thread.
+    /// Blocks SIGINT and SIGTERM for this thread and all threads made from it, and ignores SIGPIPE: writing to a closed
+    /// peer is an error like any other. To be called before the first thread is made.
     static void blockSignals();
 
 private:

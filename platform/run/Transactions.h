@@ -6,11 +6,10 @@
 
 namespace platform {
 
-/// Named spans of work during which the process would rather not be stopped. Counted, and visible in diagnostics; a
-/// service manager that asks can see what is going on. Any thread.
+/// Counts named spans of work during which the process should not be stopped, for diagnostics. Any thread.
 class Transactions {
 public:
-    /// Ends its transaction when destroyed. May outlive the registry.
+    /// Ends its transaction when destroyed. May outlive the `Transactions`.
     class [[nodiscard]] Token {
     public:
         Token() = default;
@@ -23,8 +22,9 @@ public:
     };
 
     Transactions();
+    /// Opens a transaction; several may have one name.
     Token begin(std::string name);
-    /// The open transactions, by name.
+    /// Returns how many transactions are open, by name. Names without any are absent.
     [[nodiscard]] std::map<std::string, int> open() const;
 
 private:

@@ -16,8 +16,8 @@ namespace platform {
 
 namespace {
 
-/// Counts what may be taken. Unlike a condition variable it costs the one who wakes no system call more, and unlike the
-/// standard library's semaphore it never spins.
+/// A counting semaphore. Unlike a condition variable it costs the waker no second system call, and unlike the standard
+/// library's semaphore it never spins.
 class Tokens {
 public:
     Tokens() { sem_init(&_semaphore, 0, 0); }
@@ -27,14 +27,14 @@ public:
     void give() { sem_post(&_semaphore); }
     void take()
     {
-        while (sem_wait(&_semaphore) != 0) {} // a signal
+        while (sem_wait(&_semaphore) != 0) {} // interrupted by a signal
     }
 
 private:
     sem_t _semaphore;
 };
 
-/// Threads that share one line of jobs.
+/// Threads that share one queue of jobs.
 class Crew {
 public:
     Crew(unsigned limit, int nice) : _limit(limit), _nice(nice) {}
@@ -65,7 +65,7 @@ public:
                 _threads.emplace_back([this] { work(); });
             }
         }
-        _tokens.give(); // without the mutex, which the worker that wakes needs
+        _tokens.give(); // outside the mutex, which the woken worker needs
     }
 
 private:
@@ -91,10 +91,10 @@ private:
 
     const unsigned _limit;
     const int _nice;
-    Tokens _tokens; // one for each job
+    Tokens _tokens; // one per job
     std::mutex _mutex;
     std::deque<Executor::Job> _jobs;
-    std::size_t _idle = 0; ///< threads that are not in a job
+    std::size_t _idle = 0; ///< threads without a job
     bool _stopping = false;
     std::vector<std::thread> _threads;
 };

@@ -6,15 +6,15 @@
 
 namespace platform {
 
-/// Threads that run jobs; made when there is work for them, up to the limit, and kept.
+/// Threads that run jobs. A thread is made if a job finds no idle one, up to the limit, and is kept.
 ///
-/// Default and high-priority jobs share `size` threads, high priority first; background jobs have one thread of
-/// lower CPU priority. A thread carries the last word of the queue's label while it runs the queue's tasks.
+/// Default and high-priority jobs share `size` threads; high-priority jobs overtake waiting ones. Background jobs share
+/// one thread of lower CPU priority.
 class WorkerPool final : public Executor {
 public:
-    /// `size` threads at most; 0 is the number of cores, at least 2.
+    /// 0 means as many threads as there are cores, but at least 2.
     explicit WorkerPool(unsigned size = 0);
-    /// Lets running jobs end, drops the others and joins the threads.
+    /// Waits for running jobs, destroys the others without running them, and joins the threads.
     ~WorkerPool() override;
     void execute(Priority priority, Job job) override;
 

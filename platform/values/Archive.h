@@ -8,15 +8,17 @@
 
 namespace platform {
 
-/// A record as a MessagePack archive, the form that is stored. Null fields are left out.
+/// Encodes a record as a MessagePack archive, the form that is stored. Null fields are left out. Any thread, like all
+/// of these.
 [[nodiscard]] std::string archive(const Record& record);
-/// The record in an archive. Trailing bytes are an error; declared lengths are checked against what is there.
+/// Decodes a record of one of the classes. Trailing bytes are an error. Declared lengths are checked against the bytes
+/// at hand before memory is reserved.
 [[nodiscard]] Result<std::shared_ptr<Record>> unarchive(std::string_view bytes, const RecordClasses& classes);
 
-/// A plain value as an archive.
+/// Encodes a plain value as an archive.
 [[nodiscard]] std::string archiveValue(const Value& value);
-/// What an archive holds, as plain values: a record is a dictionary with its class under "class", of any class. Limits
-/// as for `unarchive`.
+/// Decodes an archive into plain values. A record of any class becomes a dictionary with its class under "class". The
+/// limits are those of `unarchive`.
 [[nodiscard]] Result<Value> valueFromArchive(std::string_view bytes);
 
 } // namespace platform

@@ -27,7 +27,7 @@ HashKey randomHashKey()
     return {k0, word()};
 }
 
-/// SipHash-1-3 under a key of this process: keys from outside can't be chosen to collide.
+/// SipHash-1-3 under a random key of this process, so that nobody outside can choose keys that collide.
 std::uint64_t hashOf(std::string_view text)
 {
     static const HashKey key = randomHashKey();

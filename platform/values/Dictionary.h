@@ -12,10 +12,10 @@
 
 namespace platform {
 
-/// String keys to values, in the order in which the keys were first set.
+/// Maps strings to values, in the order in which the keys were first set.
 ///
-/// Look-up is linear up to a few entries and hashed above, so a hostile document of a million keys costs no
-/// more than its length.
+/// A few entries are searched one by one, more of them by a hash that a document can't be made to collide: a hostile
+/// one of a million keys costs no more than its length. A dictionary may be read by many threads, or written by one.
 class Dictionary {
 public:
     using Entry = std::pair<std::string, Value>;
@@ -28,11 +28,12 @@ public:
     Dictionary& operator=(Dictionary&&) noexcept;
     ~Dictionary();
 
+    /// Returns the value of a key, or null. Valid until the dictionary is changed.
     [[nodiscard]] const Value* find(std::string_view key) const;
     [[nodiscard]] bool contains(std::string_view key) const { return find(key) != nullptr; }
-    /// Sets the value of a key, keeping its place if it is there already.
+    /// Sets the value of a key. An existing key keeps its place.
     void set(std::string key, Value value);
-    /// True if the key was there. Costs as much as the dictionary is long.
+    /// Returns true if the key existed. Takes time proportional to the size.
     bool remove(std::string_view key);
     void reserve(std::size_t count);
 
@@ -41,6 +42,7 @@ public:
     [[nodiscard]] auto begin() const { return _entries.begin(); }
     [[nodiscard]] auto end() const { return _entries.end(); }
 
+    /// Regardless of order.
     friend bool operator==(const Dictionary& a, const Dictionary& b);
 
 private:

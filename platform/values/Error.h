@@ -10,14 +10,13 @@
 
 namespace platform {
 
-/// Why something failed, as a value: where the code comes from, the code, and details under string keys.
-///
-/// The details hold a short text under "reason" wherever the maker has one.
+/// Why something failed: a code, the domain that defines it, and details under string keys. The details hold a short
+/// text under "reason" if its maker had one.
 struct Error {
     std::string domain;
     std::int64_t code = 0;
     Value userInfo;                          ///< a dictionary, or null for no details
-    std::shared_ptr<const Error> underlying; ///< what caused it, if that is known
+    std::shared_ptr<const Error> underlying; ///< the cause, or null
 
     Error() = default;
     Error(std::string domain_, std::int64_t code_, Value userInfo_ = {})
@@ -26,12 +25,12 @@ struct Error {
 
     /// An error with a "reason".
     static Error withReason(std::string domain, std::int64_t code, std::string reason);
-    /// A system call's error: domain "POSIX", code `errnum`, the system's text and `what` as the reason.
+    /// The error of a system call: domain "POSIX", code `errnum`. The reason is the system's text after `what`.
     static Error posix(int errnum, std::string_view what = {});
 
     /// The text under "reason", or the empty string.
     [[nodiscard]] std::string reason() const;
-    /// For logs: "domain code: reason".
+    /// Returns "domain code: reason", for logs.
     [[nodiscard]] std::string description() const;
 
     friend bool operator==(const Error& a, const Error& b)
@@ -42,12 +41,13 @@ struct Error {
 
 template <class T> using Result = std::expected<T, Error>;
 
-/// Domain of errors of the device layer's own readers (JSON, property lists, archives, IPC messages).
+/// The domain of errors of readers: JSON, property lists, archives, IPC messages.
 inline constexpr std::string_view kFormatErrorDomain = "Format";
-/// Codes in it: not of the format, or beyond a limit; a record of a class that the reader doesn't know.
+/// Its code for input that is not of the format or exceeds a limit.
 inline constexpr std::int64_t kFormatMalformed = 1;
+/// Its code for a record of a class that the reader doesn't know.
 inline constexpr std::int64_t kFormatUnknownClass = 2;
-/// Domain of system call errors; codes are `errno`.
+/// The domain of system call errors, whose codes are `errno` values.
 inline constexpr std::string_view kPosixErrorDomain = "POSIX";
 
 } // namespace platform

@@ -17,7 +17,7 @@
 #include "platform/values/Error.h"
 #include "platform/values/Value.h"
 
-/// Records: plain structs that list their fields once. Archives, IPC messages and tests all work from that list.
+/// Records are plain structs that list their fields once. Archives, IPC messages and tests work from that list.
 ///
 ///     struct Suggestion : platform::RecordOf<Suggestion> {
 ///         static constexpr std::string_view kClass = "Suggestion";
@@ -33,12 +33,14 @@
 /// A field is a bool, a whole number, an enumeration, a floating-point number, std::string, Uuid, Url, Bytes, Date,
 /// Value, Error, a shared_ptr to a record, or an optional or vector of these.
 ///
-/// Decoding is class-checked: a value of the wrong type, an unknown class or a record of another class than the
-/// field's is an error that names the field, and so is a null in an array of records. Unknown keys are skipped; missing
-/// keys leave the field as it was made.
+/// Decoding checks classes. A value of the wrong type, an unknown class, a record of a class other than the field's,
+/// and a null in an array of records are errors that name the field. Unknown keys are skipped; a missing key leaves its
+/// field as it was constructed.
+///
+/// A record, an encoder or a decoder belongs to one thread at a time.
 namespace platform {
 
-/// Takes one record apart, value by value, in the order in which the record lists its fields.
+/// Receives the values of one record, in the order in which the record lists its fields.
 class Encoder {
 public:
     virtual ~Encoder() = default;
@@ -60,14 +62,14 @@ public:
 
 class RecordClasses;
 
-/// Reads values back. Each read takes the value at hand and moves on; the first failure sticks, and from then on
-/// reads answer zero, so callers check once, at the end.
+/// Reads values back. Each read consumes the next value. The first failure sticks: later reads return zero, so that
+/// callers check once, at the end.
 class Decoder {
 public:
     explicit Decoder(const RecordClasses& classes) : _classes(classes) {}
     virtual ~Decoder() = default;
 
-    /// Takes a null if there is one at hand; false, and nothing taken, otherwise.
+    /// If the next value is null, consumes it and returns true; otherwise consumes nothing.
     virtual bool null() = 0;
     virtual bool boolean() = 0;
     virtual std::int64_t integer() = 0;
@@ -78,39 +80,39 @@ public:
     virtual Date date() = 0;
     virtual Value value() = 0;
     virtual void skip() = 0;
-    /// Whether there is a record at hand; nothing is taken. A dictionary that names no class is none.
+    /// Returns true if the next value is a record, and consumes nothing. A dictionary without a class is no record.
     virtual bool isRecord() = 0;
-    /// Enters a record and answers its class name, which lives as long as what is decoded. `nextKey` then moves from
-    /// key to key, and leaves at the end.
+    /// Enters a record and returns its class name, which is valid as long as the input. `nextKey` moves from key to key
+    /// and leaves the record at its end.
     virtual std::string_view beginRecord() = 0;
-    /// False at the end of the record, which is then left. The view lives as long as what is decoded.
+    /// Returns false at the end of the record, which it leaves. `name` is valid as long as the input.
     virtual bool nextKey(std::string_view& name) = 0;
-    /// Enters an array and answers a bound on its elements that is safe to reserve.
+    /// Enters an array and returns an upper bound of its elements for which memory may be reserved.
     virtual std::size_t beginArray() = 0;
-    /// False at the end of the array, which is then left.
+    /// Returns false at the end of the array, which it leaves.
     virtual bool nextElement() = 0;
 
-    /// Stops decoding. The first failure counts.
+    /// Records a failure, unless there was one before.
     void fail(std::string reason, std::int64_t code = kMalformed);
     [[nodiscard]] bool failed() const { return _failure.has_value(); }
-    /// Whoever reads a field, or an element of an array, says after a failure where it happened, the innermost first.
+    /// Tells in which field or element a failure happened; called by each reader on the way out, innermost first.
     void failedIn(std::string_view field);
     void failedIn(std::size_t index);
-    /// The failure: "FIELD: REASON", with the whole way to the field: "results[2].score: expected a double, …".
+    /// The failure, or nothing. Its reason begins with the path to the field: "results[2].score: expected a double, …".
     [[nodiscard]] std::optional<Error> error() const;
     [[nodiscard]] const RecordClasses& classes() const { return _classes; }
 
-    /// Codes of the errors made here, in kFormatErrorDomain.
+    /// Codes in kFormatErrorDomain.
     static constexpr std::int64_t kMalformed = kFormatMalformed;
     static constexpr std::int64_t kUnknownClass = kFormatUnknownClass;
 
 protected:
-    /// Fails because `expected` ("an integer") was to be read where there is a value of type `found`.
+    /// Fails because the next value is of type `found` instead of `expected` ("an integer").
     void failExpecting(std::string_view expected, Value::Type found);
 
 private:
     struct Failure {
-        std::string place; ///< of the value that could not be read, as far as it is known
+        std::string place; ///< path to the value, as far as it is known
         std::string reason;
         std::int64_t code;
     };
@@ -125,18 +127,17 @@ public:
     [[nodiscard]] virtual std::string_view className() const = 0;
     [[nodiscard]] virtual std::size_t fieldCount() const { return 0; }
     virtual void encodeFields(Encoder&) const {}
-    /// Reads the value of `key`; false if the record has no such field, and nothing is taken. `next` is where the field
-    /// is looked for first, by its place in the record's list; it moves on behind the field that was found. Whoever
-    /// wrote the record did so in that order.
+    /// Reads the value of `key`. Returns false, and consumes nothing, if the record has no such field. Fields are
+    /// usually in the order of the list: the search begins at index `next`, which is set to that after the field found.
     virtual bool decodeField(std::string_view key, Decoder& decoder, std::size_t& next);
 
 protected:
-    /// How a field is read into a record of the class that lists it.
+    /// Reads a field into a record of the class that lists it.
     struct FieldReader {
         std::string_view name;
         void (*read)(Record&, Decoder&);
     };
-    /// All fields in the order of the list, those of the base first.
+    /// All fields in the order of the lists, the base's first.
     [[nodiscard]] virtual std::span<const FieldReader> fieldReaders() const { return {}; }
 };
 
@@ -149,7 +150,7 @@ template <class Owner, class Member> constexpr Field<Owner, Member> field(std::s
     return {name, member};
 }
 
-/// The record classes that a reader accepts, by name, in no order.
+/// The record classes that a reader accepts, by name. Immutable once filled: any thread.
 class RecordClasses {
 public:
     using Factory = std::shared_ptr<Record> (*)();
@@ -164,7 +165,7 @@ public:
         return classes;
     }
     void addAll(const RecordClasses& other) { _factories.insert(other._factories.begin(), other._factories.end()); }
-    /// Null for an unknown name.
+    /// Returns a new record, or null for an unknown name.
     [[nodiscard]] std::shared_ptr<Record> make(std::string_view className) const
     {
         auto found = _factories.find(className);
@@ -179,18 +180,18 @@ private:
 
 void encodeRecord(Encoder& encoder, const Record& record);
 
-/// Reads a record of any known class; null after a failure.
+/// Reads a record of any known class. Returns null after a failure.
 [[nodiscard]] std::shared_ptr<Record> decodeRecord(Decoder& decoder);
-/// Reads a record of a known class that is wanted (the record is fresh). Whatever else is at hand is skipped: null, and
-/// no failure.
+/// Reads the next record if its class is known and `wanted`, which is asked about a fresh record. Skips anything else
+/// and returns null, which is no failure.
 [[nodiscard]] std::shared_ptr<Record> decodeRecordIf(Decoder& decoder, bool (*wanted)(const Record&));
-/// The same for a record that is a `T`.
+/// Likewise for records that are a `T`.
 template <class T> [[nodiscard]] std::shared_ptr<T> decodeRecordIfA(Decoder& decoder)
 {
     const auto isA = [](const Record& record) { return dynamic_cast<const T*>(&record) != nullptr; };
     return std::dynamic_pointer_cast<T>(decodeRecordIf(decoder, isA));
 }
-/// Reads the record at hand into `record`, which must be of the class found there.
+/// Reads the next record, which must be of the class of `record`, into it.
 void decodeRecordInto(Decoder& decoder, Record& record);
 
 namespace detail {
@@ -307,7 +308,7 @@ template <class T> void decodeValue(Decoder& decoder, T& value)
 
 } // namespace detail
 
-/// Base of a record `Self` that extends the record `Base`; see the top of this file.
+/// The base of a record `Self` that extends the record `Base`; see the top of this file.
 template <class Self, class Base = Record> class RecordOf : public Base {
 public:
     using Base::Base;
@@ -350,7 +351,7 @@ private:
     }
 };
 
-/// What was decoded, as the record class that it must be.
+/// Returns the decoded record as a `T`; an error if it is of another class.
 template <class T> [[nodiscard]] Result<std::shared_ptr<T>> castRecord(Result<std::shared_ptr<Record>> record)
 {
     if (!record) return std::unexpected(std::move(record.error()));

@@ -22,12 +22,12 @@ class Dictionary;
 
 /// One value of a JSON document, a property list or an IPC message.
 ///
-/// Copies are cheap: strings, arrays and dictionaries are shared and copied when one holder changes its own
-/// (`mutableArray()`, `mutableDictionary()`). A value handed to another thread is safe to read there; one
-/// object must not be written by two threads, as with any other type.
+/// Copies are cheap: strings, arrays and dictionaries are shared, and copied when one holder changes its own
+/// (`mutableArray()`, `mutableDictionary()`). Copies may be used on different threads; one object may be read by many
+/// threads, or written by one.
 ///
-/// Reading never fails: an accessor that doesn't fit answers "nothing", and `operator[]` on what isn't there
-/// answers the null value, so `bag["a"]["b"].asString()` needs no checks in between.
+/// Reading never fails: an accessor of another type returns nothing, and `operator[]` of a missing entry returns the
+/// null value, so that `bag["a"]["b"].asString()` needs no checks in between.
 class Value {
 public:
     enum class Type : std::uint8_t { Null, Bool, Int, UInt, Double, String, Bytes, Date, Array, Dictionary };
@@ -36,7 +36,7 @@ public:
     Value() = default;
     Value(std::nullptr_t) {}
     Value(bool b) : _storage(b) {}
-    /// Any other integer. Unsigned ones that fit are kept as signed, so equal numbers compare equal.
+    /// Any other integer. Unsigned numbers that fit are kept as signed ones, so that equal numbers compare equal.
     template <class I>
         requires(std::is_integral_v<I> && !std::is_same_v<I, bool>)
     Value(I i)
@@ -60,7 +60,7 @@ public:
     Value& operator=(Value&& other) noexcept;
     ~Value();
 
-    /// A dictionary of the pairs given, in their order.
+    /// Returns a dictionary of the pairs, in their order.
     static Value dictionaryOf(std::initializer_list<std::pair<std::string, Value>> entries);
 
     [[nodiscard]] Type type() const { return static_cast<Type>(_storage.index()); }
@@ -68,39 +68,38 @@ public:
     [[nodiscard]] bool isNumber() const;
 
     [[nodiscard]] std::optional<bool> asBool() const;
-    /// Integers that fit, and doubles that are whole and fit.
+    /// An integer that fits, or a double that is whole and fits.
     [[nodiscard]] std::optional<std::int64_t> asInt() const;
     [[nodiscard]] std::optional<std::uint64_t> asUInt() const;
     /// Any number.
     [[nodiscard]] std::optional<double> asDouble() const;
-    /// The string, or null for another type. Lives as long as this value is unchanged.
+    /// The string, or null for another type; likewise the next four. Valid until this value is changed.
     [[nodiscard]] const std::string* asString() const;
     [[nodiscard]] const platform::Bytes* asBytes() const;
     [[nodiscard]] std::optional<platform::Date> asDate() const;
     [[nodiscard]] const Array* asArray() const;
     [[nodiscard]] const Dictionary* asDictionary() const;
 
-    /// The entry of a dictionary; the null value where there is none.
+    /// The entry of a dictionary, or the null value.
     [[nodiscard]] const Value& operator[](std::string_view key) const;
-    /// Without this, a literal would be taken for an index.
+    /// For literals, which would otherwise convert to an index.
     [[nodiscard]] const Value& operator[](const char* key) const { return (*this)[std::string_view(key)]; }
-    /// The element of an array; the null value where there is none.
+    /// The element of an array, or the null value.
     template <class I>
         requires std::is_integral_v<I>
     [[nodiscard]] const Value& operator[](I index) const
     {
         return element(static_cast<std::size_t>(index));
     }
-    /// Elements of an array or entries of a dictionary; 0 for anything else.
+    /// The number of elements of an array or entries of a dictionary; 0 for other types.
     [[nodiscard]] std::size_t count() const;
 
-    /// This value's own array to change; anything else becomes an empty array first.
+    /// Returns this value's own array, to be changed. A value of another type becomes an empty array first.
     [[nodiscard]] Array& mutableArray();
-    /// This value's own dictionary to change; anything else becomes an empty dictionary first.
+    /// Returns this value's own dictionary, to be changed. A value of another type becomes an empty dictionary first.
     [[nodiscard]] Dictionary& mutableDictionary();
 
-    /// Equal type and contents; integers compare by number whatever their signedness; dictionaries compare
-    /// without regard to order.
+    /// Compares type and contents, dictionaries regardless of order.
     friend bool operator==(const Value& a, const Value& b);
 
 private:
@@ -112,10 +111,10 @@ private:
         _storage;
 };
 
-/// "null", "bool", … for error texts.
+/// Returns "null", "bool", …, for error texts.
 [[nodiscard]] std::string_view typeName(Value::Type type);
 
-/// How deep arrays and dictionaries may nest in anything that is read from outside.
+/// How deep arrays and dictionaries may nest in input from outside.
 constexpr std::size_t kMaximumDepth = 128;
 
 } // namespace platform

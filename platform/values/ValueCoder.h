@@ -6,10 +6,11 @@
 
 namespace platform {
 
-/// A record as a dictionary with its class under "class": the form that crosses IPC as a{sv}. Null fields are left out.
+/// Encodes a record as a dictionary with its class under "class", the form that crosses IPC as a{sv}. Null fields are
+/// left out. Any thread, like all of these.
 [[nodiscard]] Value toValue(const Record& record);
-/// The record in such a dictionary. A date may be a number, seconds since 1970, as IPC messages have them. Records may
-/// nest `kMaximumDepth` deep, here and in archives; so may a field of type Value in itself.
+/// Decodes such a dictionary. A date may be a number: seconds since 1970, as in IPC messages. Records may nest
+/// `kMaximumDepth` deep, here and in archives, and so may each field of type Value.
 [[nodiscard]] Result<std::shared_ptr<Record>> recordFromValue(const Value& value, const RecordClasses& classes);
 
 } // namespace platform
