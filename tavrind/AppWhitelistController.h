@@ -15,17 +15,18 @@ namespace tavrin {
 
 struct Assembly;
 
-/// The signature of those installed applications that the allow-list names, the resource "TAVInstalledAppWhitelist".
+/// Computes the signature of the installed applications that the allow-list, the resource "TAVInstalledAppWhitelist",
+/// names.
 ///
-/// A signature is kept in the user defaults. It is computed when there is none at start-up, and whenever applications
-/// come or go; a new allow-list alone is not a reason. One computation runs at a time, on a background queue; a reason
-/// that comes up meanwhile is dropped. Any thread.
+/// The signature is kept in the user defaults. It is computed at start-up if none is stored, and whenever applications
+/// come or go; a new allow-list alone is no reason. One computation runs at a time, on a background queue; requests in
+/// the meantime are dropped. Any thread.
 class AppWhitelistController : public std::enable_shared_from_this<AppWhitelistController> {
 public:
     static std::shared_ptr<AppWhitelistController> make(Assembly& assembly);
     explicit AppWhitelistController(Assembly& assembly);
 
-    /// Base64 text; empty for none.
+    /// Returns the base64 text, or the empty string.
     [[nodiscard]] std::string whitelistSignature() const;
 
 private:
@@ -39,9 +40,9 @@ private:
     std::atomic<bool> _generating = false;
 };
 
-/// The signature that an allow-list (JSON, 32 MiB at most) gives for the applications installed. None where it isn't an
-/// allow-list of the known encoding, or none of its applications is installed. The applications are read only for a
-/// list that is sound.
+/// Returns the signature of the installed applications by an allow-list (JSON, at most 32 MiB); nothing if that is no
+/// allow-list of the known encoding or none of its applications is installed. Reads the applications only if the list
+/// is valid. Takes time: background queues only.
 [[nodiscard]] std::optional<std::string> processWhitelist(std::string_view whitelist,
                                                           platform::InstalledApplications& installed);
 

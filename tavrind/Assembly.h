@@ -32,11 +32,11 @@ class TavrinPersistentStorage;
 class TavrinSubscriptionManager;
 class TavrinUserGUIDController;
 
-/// Every long-lived service of the daemon, in one place.
+/// Holds every long-lived service of the daemon.
 ///
-/// Services are made once, in the order that Startup.cpp fixes, and live as long as the assembly. Each takes the
-/// assembly and reaches its siblings through it, when it needs them: while the start-up order runs, those made later
-/// are still null. After start-up nothing here changes, so any thread may read it.
+/// Services are made once, in the order of Startup.cpp, and live as long as the assembly. Each takes the assembly and
+/// reaches its siblings through it when it needs them; during start-up, siblings that come later are null. After
+/// start-up nothing here changes: any thread may read it.
 struct Assembly {
     explicit Assembly(platform::Device& device);
     ~Assembly();
@@ -61,10 +61,10 @@ struct Assembly {
     std::shared_ptr<BackgroundActivitiesManager> backgroundFlusher;
     std::shared_ptr<TavrinUserGUIDController> guidController;
     std::shared_ptr<ClientSessionManager> clientSessionManager;
-    std::shared_ptr<platform::Queue> dateQueue; ///< sessions settle on it, one by one, which is the day's first
+    std::shared_ptr<platform::Queue> dateQueue; ///< sessions decide on it which is the day's first
     std::shared_ptr<Lookup> lookup;
     bool sharedSession;         ///< all clients share one session and one GUID
-    bool testFeedbacks = false; ///< sessions keep their feedback in memory too
+    bool testFeedbacks = false; ///< sessions also keep their feedback in memory
     std::shared_ptr<TavrinSubscriptionManager> subscriptionManager;
     std::shared_ptr<TavrinFeedbackFlusher> crowdsourcingFeedbackFlusher;
     std::shared_ptr<TavrinFlusherXPC> flusherXPCListener;

@@ -2,7 +2,7 @@
 
 namespace tavrin {
 
-/// Switches that are settled when the daemon is built.
+/// Switches that are fixed at build time.
 class Flags {
 public:
     [[nodiscard]] static constexpr bool diskBagCacheEnabled() { return true; }

@@ -23,6 +23,7 @@ namespace tavrin {
 
 using platform::Dictionary;
 using platform::FileHandle;
+using platform::Private;
 using platform::Value;
 
 namespace {
@@ -41,14 +42,6 @@ std::string versionIn(const Dictionary& versions, const std::string& identifier)
 {
     const Value* version = versions.find(identifier);
     return version && version->asString() ? *version->asString() : std::string();
-}
-
-std::string shortened(const Value& value)
-{
-    constexpr std::size_t kLongest = 200; // bytes of what may be megabytes
-    std::string text = platform::toJson(value);
-    if (text.size() > kLongest) text = text.substr(0, kLongest) + "…";
-    return text;
 }
 
 float numberIn(const Value& value)
@@ -125,10 +118,11 @@ private:
 void Lookup::filterLookupResultsWithRequest(const TAVLookupRequest& request, Value& response, const std::string& locale)
 {
     if (!response.asArray())
-        return log().error("lookup response is not an array. who knows what this is: {}", shortened(response));
+        return log().error("lookup response is not an array. who knows what this is: {}",
+                           Private{platform::toJson(response)});
     if (response.count() == 0)
-        return log().error("no data to process for lookup response. request: {} response: {}", request.queryString,
-                           shortened(response));
+        return log().error("no data to process for lookup response. request: {} response: {}",
+                           Private{request.queryString}, Private{platform::toJson(response)});
     LookupContext context(request.queryContext.value_or(""), locale);
     for (Value& resultSet : response.mutableArray()) {
         if (!resultSet.asDictionary()) continue;

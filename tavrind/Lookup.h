@@ -18,35 +18,32 @@ namespace tavrin {
 struct Assembly;
 struct TAVLookupRequest;
 
-/// Keeps the lookup hints that are downloaded installed in the device's data-detector store.
+/// Installs downloaded lookup hints in the device's data-detector store.
 ///
-/// A hints file is installed when it was downloaded, and taken away when it was deleted. At start-up those that the
-/// store doesn't have in the version at hand are installed again. What fails is logged, and not tried again before
-/// that.
-///
-/// Any thread.
+/// A hints file is installed after its download, and removed after its deletion. At start-up, files of which the store
+/// has another version are installed again. Failures are logged; the next try is the next start-up. Any thread.
 class Lookup : public LookupResources, public std::enable_shared_from_this<Lookup> {
 public:
     /// Kinds of source in the data-detector store.
     enum SourceKind : int { Weekly = 2, Monthly = 3 };
 
-    /// Begins to follow the hints files, and tells the download manager of it.
+    /// Starts observing the hints files, and registers with the download manager. The assembly must outlive it.
     static std::shared_ptr<Lookup> make(Assembly& assembly);
     explicit Lookup(Assembly& assembly);
 
-    /// True, unless the shared setting "LookupSuggestionsDisabled" is.
+    /// Returns true unless the shared setting "LookupSuggestionsDisabled" is true.
     [[nodiscard]] bool lookupEnabled() const override;
-    /// "c-d-b" for the path /a/b/c/d or one that goes on from there. A shorter one is logged, and has none.
+    /// Returns "c-d-b" for a path that begins with /a/b/c/d. A shorter path is logged, and returns nothing.
     [[nodiscard]] std::optional<std::string> signatureFromURL(const platform::Url& url) const override;
 
-    /// Leaves out of a lookup's decoded answer, an array of result sets, those results whose "lookup_instructions"
-    /// don't fit the text around the word: its keywords are too light, its completion doesn't occur, or too few words
-    /// are also in its subject. Texts are compared as `locale` ("de_CH") does, without regard to case; the words of the
-    /// subject as they stand. What isn't of that form is kept.
+    /// Removes from a decoded answer, an array of result sets, the results whose "lookup_instructions" don't fit the
+    /// text around the looked-up word: the keywords found there weigh too little, the completion doesn't occur, or too
+    /// few words occur in the subject, too. Texts are compared by `locale` ("de_CH") regardless of case, words of the
+    /// subject exactly. Results without instructions stay.
     static void filterLookupResultsWithRequest(const TAVLookupRequest& request, platform::Value& response,
                                                const std::string& locale);
 
-    /// Runs what is queued, and returns then.
+    /// Blocks until all queued work has run.
     void _drainQueue();
 
 private:

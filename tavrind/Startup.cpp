@@ -31,7 +31,7 @@ namespace {
 
 using namespace std::chrono_literals;
 
-/// Certification authorities in place of the system's, for a service of one's own: the variable that OpenSSL reads.
+/// The certification authorities that replace the system's, from the variable that OpenSSL reads.
 std::string caFile()
 {
     const char* path = std::getenv("SSL_CERT_FILE");
@@ -103,7 +103,7 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device)
 
     auto listener = device.ipc.listen(daemonInterface(), "com.quorvane.tavrind.connection");
     if (!listener) {
-        // Tasks that are under way refer to the services: the process ends with them whole.
+        // Running tasks refer to the services, so these stay until the process exits.
         (void)daemon.release();
         return std::unexpected(std::move(listener.error()));
     }
@@ -118,7 +118,7 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device)
         launchEventQueue->async([event] { platform::defaultLog().log("launch event for {}", event); });
 
     device.globalQueue(platform::Priority::Background)->async([bagController = assembly.bagController] {
-        (void)bagController->currentBag(); // only to start the first load
+        (void)bagController->currentBag(); // starts the first load
     });
     device.globalQueue(platform::Priority::Default)->async([&notifications = assembly.notificationCenter] {
         notifications.post({.name = "TAVStartup"});

@@ -17,7 +17,7 @@ namespace tavrin {
 class TavrinDPAppDeepLinkIngester;
 class TavrinService;
 
-/// A daemon that has been started: the services, and what only the entry point holds.
+/// A started daemon: the services, and what only the entry point holds.
 struct Daemon {
     explicit Daemon(platform::Device& device);
     ~Daemon();
@@ -28,8 +28,8 @@ struct Daemon {
     std::unique_ptr<platform::ipc::Listener> listener;
 };
 
-/// Builds the services in their fixed order and opens the door. An error only where the service's socket can't be had,
-/// for example because another daemon serves it.
+/// Makes the services in their fixed order, and then listens. Fails only if the service's socket can't be had, for
+/// example because another daemon serves it. The device must outlive the daemon.
 [[nodiscard]] platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device);
 
 } // namespace tavrin

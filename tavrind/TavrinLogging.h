@@ -28,8 +28,8 @@ enum TavrinLogCategory : unsigned {
     TavrinLoggingCategoryCount
 };
 
-/// The handle of a category, all made on first use. An index out of range is a programming error and aborts. Any
-/// thread.
+/// Returns the handle of a category; the first call makes all of them. An index out of range is a programming error and
+/// aborts. Any thread.
 [[nodiscard]] const platform::Log& TavrinLogForCategory(unsigned category);
 
 } // namespace tavrin

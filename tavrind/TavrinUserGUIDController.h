@@ -16,17 +16,19 @@ struct Assembly;
 /// Posted after the GUID changed; no object, no user info.
 inline constexpr const char* TAVUserGUIDChangeNotification = "TAVUserGUIDChangeNotification";
 
-/// The GUID that identifies a user for a short while: replaced by a random one after 15 minutes, or on request.
+/// Owns the GUID that identifies a user for a short time: it is replaced by a random one after 15 minutes or on
+/// request.
 ///
-/// Rotation is lazy, nothing fires at the 15-minute mark: the first reading after it rolls. The GUID is never stored,
-/// so every start begins with a new one. Any thread.
+/// Rotation is lazy: no timer fires after 15 minutes, but the next reading rolls the GUID. It is never stored, so every
+/// start begins with a new one. Every roll is counted and posted as TAVUserGUIDChangeNotification, later and on the
+/// controller's queue. Any thread.
 class TavrinUserGUIDController : public std::enable_shared_from_this<TavrinUserGUIDController> {
 public:
     explicit TavrinUserGUIDController(Assembly& assembly);
 
-    /// The GUID, rolled first if its time is up.
+    /// Returns the GUID, and rolls it first if it has expired.
     [[nodiscard]] platform::Uuid currentUserGUID();
-    /// Rolls soon.
+    /// Rolls the GUID before the next reading.
     void reset();
 
 private:

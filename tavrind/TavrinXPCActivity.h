@@ -10,7 +10,7 @@ namespace tavrin {
 
 struct Assembly;
 
-/// When a background activity may run, put together entry by entry.
+/// Assembles the criteria of a background activity entry by entry.
 struct TavrinXPCCriteria {
     [[nodiscard]] static platform::ActivityCriteria createCriteria() { return {}; }
     static void setRepeating(bool repeating, platform::ActivityCriteria& criteria) { criteria.repeating = repeating; }
@@ -29,16 +29,16 @@ struct TavrinXPCCriteria {
     }
 };
 
-/// The device's background activities, as this daemon uses them. Any thread.
+/// Operations on the device's background activities. Any thread.
 struct TavrinXPCActivity {
     using Handler = platform::ActivityScheduler::Handler;
     static void registerActivity(Assembly& assembly, const std::string& identifier, platform::ActivityCriteria criteria,
                                  Handler handler);
     static void unregister(Assembly& assembly, const std::string& identifier);
-    /// Whether the activity moved on.
+    /// Returns true if the activity changed to `state`.
     [[nodiscard]] static bool setState(platform::ActivityState state, platform::Activity& activity);
     [[nodiscard]] static platform::ActivityState getStateForActivity(const platform::Activity& activity);
-    /// Whether a run under way should stop and wait for a better moment.
+    /// Returns true if the current run should stop and wait for a better moment.
     [[nodiscard]] static bool shouldDefer(const platform::Activity& activity);
 };
 

@@ -8,19 +8,19 @@
 
 #include "platform/values/Error.h"
 
-// The reverse of encoder.h, as a service reads a signature. The daemon only writes them. Pure functions: any thread.
+// The inverse of encoder.h, as a service reads signatures; the daemon only writes them. Pure functions: any thread.
 
 namespace tavrin {
 
-/// The stored length of a run, which is its number of bits less 1. `lengths` begins with the first run's byte.
+/// Returns the stored length of a run, its number of bits minus 1. `lengths` begins with the first run's byte.
 [[nodiscard]] inline unsigned getRunLength(std::string_view lengths, std::size_t run)
 {
     return static_cast<unsigned char>(lengths[run]);
 }
 
-/// The bitmap of `outputLength` bytes that `rle_compress` coded into `buffer`: `payloadLength` bytes at
-/// `payloadOffset`, behind the four of the digest. None where the lengths don't agree, or the runs hold more bits than
-/// the bitmap.
+/// Decodes the bitmap of `outputLength` bytes that `rle_compress` coded into `buffer`: `payloadLength` bytes at
+/// `payloadOffset`, after the four of the digest. Returns nothing if the lengths don't agree or the runs have more bits
+/// than the bitmap.
 [[nodiscard]] std::optional<std::string> rle_expand(std::string_view buffer, std::size_t payloadOffset,
                                                     std::size_t payloadLength, std::size_t outputLength,
                                                     bool compressed);
@@ -31,7 +31,7 @@ struct AppSignature {
     std::string bitmap;
 };
 
-/// Takes a signature's base64 text apart, and checks both checksums. An error says what is wrong.
+/// Decodes a signature's base64 text and verifies both checksums. The error says what is wrong.
 [[nodiscard]] platform::Result<AppSignature> readSignature(std::string_view text);
 
 } // namespace tavrin

@@ -6,33 +6,33 @@
 #include <string>
 #include <string_view>
 
-// The signature of a set of small numbers: a bitmap, run-length coded where that is shorter, framed with a checksum.
-// docs/formats.md has the layout, byte by byte. Pure functions: any thread.
+// The signature of a set of small numbers: a bitmap, run-length coded if that is shorter, framed with a checksum.
+// docs/formats.md describes every byte. Pure functions: any thread.
 
 namespace tavrin {
 
-/// The largest number that a signature can tell of: the bitmap's length has 16 bits.
+/// The largest number that a signature can hold: the bitmap's length has 16 bits.
 inline constexpr std::uint32_t kMaximumEncodingId = 524'279;
 
-/// Bit n, counted from the most significant of the first byte, is set for every n of `ids`, in ascending order and
-/// kMaximumEncodingId at most. The length is the largest id divided by 8, rounded up: a largest id that is a multiple
-/// of 8 falls off the end. Services rely on that.
+/// Returns a bitmap with bit n set for every n of `ids`, counted from the most significant bit of the first byte. `ids`
+/// are in ascending order and at most kMaximumEncodingId. The length in bytes is the largest id divided by 8, rounded
+/// up: if that id is a multiple of 8, its bit is lost. Services rely on this.
 [[nodiscard]] std::string bitmapOf(std::span<const std::uint32_t> ids);
 
 struct RunLengthCoding {
     std::string bytes;
-    bool compressed = false; ///< else the bytes hold the bitmap as it is
+    bool compressed = false; ///< if false, the bytes are the bitmap itself
 };
 
-/// The run-length coding of a bitmap of 65,535 bytes at most, or the bitmap where the coding isn't shorter.
+/// Returns the run-length coding of a bitmap of at most 65,535 bytes, or the bitmap if the coding isn't shorter.
 [[nodiscard]] RunLengthCoding encodeRun(std::string_view bitmap);
 
-/// The same behind the last four bytes of the bitmap's MD5 digest.
+/// Returns the same after the last four bytes of the bitmap's MD5 digest.
 [[nodiscard]] RunLengthCoding rle_compress(std::string_view bitmap);
 
-/// The base64 text that is sent. `payload` is what `rle_compress` made of a bitmap of `bitmapLength` bytes; `version`
-/// is the list's, in hexadecimal: its last two bytes count, and those that it doesn't have are 0. None for a version
-/// that is no whole number of hexadecimal bytes.
+/// Returns the base64 text that is sent. `payload` is the result of `rle_compress` for a bitmap of `bitmapLength`
+/// bytes. `version` is the list's version in hexadecimal, of which the last two bytes are used; missing ones are 0.
+/// Returns nothing if the version is not a whole number of hexadecimal bytes.
 [[nodiscard]] std::optional<std::string> makeSignature(std::uint16_t bitmapLength, const RunLengthCoding& payload,
                                                        std::string_view version);
 

@@ -34,8 +34,10 @@ namespace ipc {
 class Transport;
 }
 
-/// The device that the daemon runs on: what a service needs from outside, by role. Plain references, set once and never
-/// null; whoever makes a Device keeps its parts alive longer than every service. tests/support has one of twins.
+/// The device that the daemon runs on: what services need from outside, by role.
+///
+/// Set once, before the first service is made: any thread may read it. Its maker owns the parts and keeps them alive
+/// longer than every service. `SystemDevice` is the real one, tests/support has one of fakes.
 struct Device {
     Clock& clock;
     Executor& executor;     ///< worker threads
@@ -61,20 +63,19 @@ struct Device {
     BackgroundSessions& backgroundSessions;
     ActivityScheduler& activities;
     ipc::Transport& ipc;
-    std::vector<std::string>
-        launchEvents{}; ///< names of what the service manager started the process for: units, sockets
+    std::vector<std::string> launchEvents{}; ///< the units or sockets for which the process was started
 
     [[nodiscard]] std::shared_ptr<Queue> serialQueue(std::string label, Priority priority = Priority::Default) const;
     [[nodiscard]] std::shared_ptr<Queue> concurrentQueue(std::string label,
                                                          Priority priority = Priority::Default) const;
-    /// A shared concurrent queue of that priority, for work that guards no state.
+    /// The shared concurrent queue of that priority, for work that guards no state.
     [[nodiscard]] std::shared_ptr<Queue> globalQueue(Priority priority) const;
-    /// Tasks on the main thread.
+    /// A queue whose tasks run on the main thread.
     [[nodiscard]] std::shared_ptr<Queue> mainQueue() const;
 
     std::array<std::shared_ptr<Queue>, 3> globalQueues{}; ///< by Priority; made by makeQueues
     std::shared_ptr<Queue> main{};
-    /// Makes the two above; whoever fills in a Device calls it once.
+    /// Makes the two above. The maker of a Device calls it once.
     void makeQueues();
 };
 

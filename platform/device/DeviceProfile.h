@@ -13,7 +13,7 @@ namespace platform {
 class FileSystem;
 class RunLoop;
 
-/// What the device's maker or manager says about the device, from device.json. Every member may be missing.
+/// What the device's maker or administrator tells about the device, in device.json. All members may be missing.
 struct DeviceProfile {
     std::optional<std::string> countryCode;      ///< "countryCode": ISO 3166, overrides the locale's region
     std::optional<std::string> storefront;       ///< "storefront": the media store's storefront identifier
@@ -28,19 +28,20 @@ struct DeviceProfile {
     bool operator==(const DeviceProfile&) const = default;
 };
 
-/// Reads a profile; members of the wrong type are logged and read as missing.
+/// Reads a profile. Members of the wrong type are logged and count as missing.
 [[nodiscard]] DeviceProfile deviceProfileFromValue(const Value& value);
 
-/// The profile and word of its changes. Any thread.
+/// Reports the profile and its changes. Any thread.
 class DeviceProfileSource {
 public:
     virtual ~DeviceProfileSource() = default;
     [[nodiscard]] virtual DeviceProfile profile() = 0;
-    /// Called on the run loop's thread with the new profile after a change, beside the handlers that are there.
+    /// Adds a handler, which is called on the run loop's thread with the new profile after every change.
     virtual void onChange(std::function<void(const DeviceProfile&)> handler) = 0;
 };
 
-/// `path` (device.json), read when first asked for and watched. Missing: an empty profile. Broken: logged, empty.
+/// Reads `path` (device.json) with the first request, and again after changes. A missing file is an empty profile, and
+/// so is a broken one, which is logged. Destroyed on the run loop's thread; all arguments must outlive the source.
 [[nodiscard]] std::unique_ptr<DeviceProfileSource>
 makeDeviceProfileSource(FileSystem& files, std::filesystem::path path, RunLoop& runLoop);
 

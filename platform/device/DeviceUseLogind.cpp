@@ -17,7 +17,7 @@ namespace {
 
 constexpr const char* kService = "org.freedesktop.login1";
 
-/// The one line of a file in sysfs.
+/// Returns the first line of a file, or the empty string.
 std::string lineOf(FileSystem& files, const std::filesystem::path& path)
 {
     const auto contents = files.read(path, 4096);
@@ -96,7 +96,7 @@ bool isOnBattery(const std::filesystem::path& supplies)
     for (const std::string& name : files->list(supplies).value_or(std::vector<std::string>())) {
         const auto line = [&](const char* file) { return lineOf(*files, supplies / name / file); };
         if (line("online") == "1") return false;
-        // A mouse's battery is of the scope "Device".
+        // The battery of a mouse or the like has the scope "Device".
         battery = battery || (line("type") == "Battery" && line("scope") != "Device" && line("present") != "0");
     }
     return battery;

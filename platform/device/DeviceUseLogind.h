@@ -9,13 +9,13 @@ namespace platform {
 
 class RunLoop;
 
-/// Reads the power supplies in `supplies`, and asks logind over the system bus. Without supplies: mains. Without
-/// logind: nobody at the screen, unlocked. The run loop must outlive it; made and destroyed on its thread.
+/// Reads the power supplies in `supplies` and asks logind over the system bus. Without supplies the device is on mains;
+/// without logind no one is at the screen, and the device is unlocked. Made and destroyed on the run loop's thread; the
+/// run loop must outlive it.
 [[nodiscard]] std::unique_ptr<DeviceUseSource>
 makeSystemDeviceUse(RunLoop& runLoop, std::filesystem::path supplies = "/sys/class/power_supply");
 
-/// Whether the device runs on a battery of its own, by the kernel's power supplies; not where one of them is plugged
-/// in.
+/// Returns true if the kernel's power supplies include a battery of the device's own, and none is plugged in.
 [[nodiscard]] bool isOnBattery(const std::filesystem::path& supplies);
 
 } // namespace platform

@@ -9,7 +9,7 @@
 
 namespace platform {
 
-/// The user's locale, as far as requests tell it.
+/// The user's locale, as far as requests describe it.
 struct LocaleContext {
     std::string identifier = "en_US";                     ///< "de_CH"
     std::string systemLanguage = "en";                    ///< language of the user interface, BCP 47: "de", "zh-Hant"
@@ -22,20 +22,20 @@ struct LocaleContext {
     bool operator==(const LocaleContext&) const = default;
 };
 
-/// Where the locale and the time zone come from, and word of their changes. Any thread.
+/// Reports the locale, the time zone and the keyboard, and changes of the first two. Any thread.
 class LocaleSource {
 public:
     virtual ~LocaleSource() = default;
     [[nodiscard]] virtual LocaleContext locale() = 0;
-    /// IANA name of the local time zone: "Europe/Zurich".
+    /// Returns the IANA name of the local time zone: "Europe/Zurich".
     [[nodiscard]] virtual std::string timeZone() = 0;
-    /// The input mode of the current keyboard ("de_CH@sw=QWERTZ"-like text of the platform's making); empty if unknown.
+    /// Returns the input mode of the current keyboard, a text like "de_CH@sw=QWERTZ"; empty if unknown.
     [[nodiscard]] virtual std::string keyboardInputMode() = 0;
-    /// The first input mode that is on by default for the current locale.
+    /// Returns the input mode that the current locale has by default.
     [[nodiscard]] virtual std::string defaultInputMode() = 0;
 
     enum class Change { Locale, TimeZone };
-    /// Called on the run loop's thread after a change. One handler.
+    /// Calls `handler` on the run loop's thread after every change. One handler; a new one replaces it.
     virtual void onChange(std::function<void(Change)> handler) = 0;
 };
 

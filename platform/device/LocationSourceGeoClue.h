@@ -9,8 +9,9 @@ namespace platform {
 
 class RunLoop;
 
-/// GeoClue2 on the system bus. Without a bus, the service or the user's leave there is no location.
-/// Nothing is contacted before sources are allowed. The user grants leave to `desktopId`.
+/// Asks GeoClue2 over the system bus. There is no location without a bus, the service, or the user's permission, which
+/// is given to `desktopId`. Nothing is contacted before sources are allowed. Made and destroyed on the run loop's
+/// thread; the run loop must outlive it.
 [[nodiscard]] std::unique_ptr<LocationSource> makeGeoClueLocationSource(RunLoop& runLoop, std::string desktopId);
 
 } // namespace platform

@@ -61,7 +61,7 @@ private:
     void arm()
     {
         auto trigger = _open();
-        if (!trigger) return defaultLog().info("memory pressure goes unseen: {}", trigger.error().description());
+        if (!trigger) return defaultLog().info("memory pressure is not watched: {}", trigger.error().description());
         _trigger = std::move(*trigger);
         _watch = _runLoop.watch(_trigger.fd(), EPOLLPRI, [this](std::uint32_t events) {
             const auto self = shared_from_this(); // the last watcher may go

@@ -12,12 +12,12 @@ namespace platform {
 
 class RunLoop;
 
-/// A descriptor on which poll(2) shows POLLPRI when for 200 ms of two seconds every task that could have run waited for
-/// memory (the kernel's pressure stall information, which lets any user ask for windows of two seconds).
+/// Opens a trigger of the kernel's pressure stall information: poll(2) reports POLLPRI on it if all runnable tasks
+/// waited for memory during 200 ms of two seconds, the shortest window that any user may ask for.
 [[nodiscard]] Result<FileHandle> openPressureTrigger(const std::filesystem::path& path = "/proc/pressure/memory");
 
-/// The device's memory pressure. Where the trigger can't be had, which is logged, or ends, no pressure is ever seen.
-/// `openTrigger` is called on the run loop, for each time that watching begins.
+/// Makes the device's memory pressure. Without a trigger, which is logged, no pressure is ever reported. `openTrigger`
+/// is called on the run loop's thread whenever watching begins. The run loop must outlive it.
 [[nodiscard]] std::unique_ptr<MemoryPressure> makeMemoryPressure(
     RunLoop& runLoop, std::function<Result<FileHandle>()> openTrigger = [] { return openPressureTrigger(); });
 

@@ -34,14 +34,14 @@ public:
         std::erase_if(*names, [](const std::string& name) { return !name.ends_with(".json"); });
         std::ranges::sort(*names);
         if (names->size() > kMaximumFiles) {
-            defaultLog().error("of {} subscription files {} are read", names->size(), kMaximumFiles);
+            defaultLog().error("of {} subscription files, {} are read", names->size(), kMaximumFiles);
             names->resize(kMaximumFiles);
         }
         std::map<std::string, Value> services;
         for (const std::string& name : *names) {
             const auto path = _directory / name;
             const auto info = _files.info(path);
-            if (!info) continue; // it has just gone
+            if (!info) continue; // removed meanwhile
             if (auto service = read(path)) {
                 const std::string provider = *(*service)["provider"].asString();
                 services.erase(provider);
@@ -58,7 +58,7 @@ public:
         const bool watched = static_cast<bool>(_handler);
         _handler = std::move(handler);
         if (watched) return;
-        // Made on the loop's thread, where it must live; what changed until then is looked for once.
+        // The watch lives on the run loop's thread. What changed before it was made is reported once.
         _runLoop.execute(Priority::Default, [this] {
             _watch.emplace(_runLoop, _directory / "", [this] { changed(); });
             changed();

@@ -43,7 +43,7 @@ namespace platform {
 
 namespace {
 
-/// What the service manager started this process for: a timer, or else the names of its sockets.
+/// Returns why the service manager started this process: a timer unit, or else the names of its sockets.
 std::vector<std::string> launchEvents()
 {
     if (const char* unit = std::getenv("TRIGGER_UNIT"); unit && *unit) return {unit};
@@ -58,7 +58,7 @@ std::vector<std::string> launchEvents()
     return events;
 }
 
-/// The user's and the system's, in the order in which they are looked through.
+/// The user's and then the system's, in order of precedence.
 std::vector<std::filesystem::path> dataDirectories(const Directories& directories)
 {
     std::vector<std::filesystem::path> all = directories.systemData;
@@ -163,7 +163,7 @@ struct SystemDevice::Impl {
 
 namespace {
 
-/// Every client takes a descriptor, and the usual soft limit is made for select(), which is used nowhere here.
+/// Every client takes a descriptor. The usual soft limit exists for select(), which nothing here uses.
 void raiseDescriptorLimit()
 {
     rlimit limit{};

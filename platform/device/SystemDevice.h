@@ -8,16 +8,16 @@ namespace platform {
 struct Device;
 class RunLoop;
 
-/// What the service is called towards the device.
+/// The names by which the device knows the service.
 struct DeviceNames {
-    std::string service;         ///< its files and folders in the user's directories: "com.example.service"
-    std::string sharedSuite;     ///< the user defaults shared with clients
+    std::string service;         ///< of its files and folders in the user's directories: "com.example.service"
+    std::string sharedSuite;     ///< of the user defaults shared with clients
     std::string objectPath;      ///< of the object that posts notify signals
     std::string notifyInterface; ///< the D-Bus interface of these signals
 };
 
-/// The real device. Nothing is scanned, connected or read before it is asked for; absent facilities behave as their
-/// headers say. Made on the main thread before any other; lives as long as the process.
+/// The real device. Scans, connects and reads nothing before it is asked to; absent facilities behave as their headers
+/// say. Made on the main thread before any other thread; lives as long as the process.
 class SystemDevice {
 public:
     /// The run loop must outlive it. Raises the process's limit of open files as far as the system allows.

@@ -4,11 +4,11 @@
 
 namespace platform {
 
-/// Tells other processes of the user that something happened, by name: a signal on the session bus.
+/// Tells other processes of the user that something happened, by name. Any thread.
 class SystemNotifier {
 public:
     virtual ~SystemNotifier() = default;
-    /// Posts `name` ("com.example.changed"); nothing where there is no session bus. Any thread.
+    /// Posts `name` ("com.example.changed") later, if anything can receive it.
     virtual void post(const std::string& name) = 0;
 };
 

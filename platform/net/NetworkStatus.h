@@ -12,26 +12,26 @@ namespace platform {
 /// How the device reaches the network.
 struct NetworkState {
     bool online = true;
-    bool metered = false; ///< what is sent costs, or is counted
+    bool metered = false; ///< traffic costs or counts
     friend bool operator==(const NetworkState&, const NetworkState&) = default;
 };
 
-/// Knows the state of the network, and tells whoever observes it. Any thread.
+/// Reports the state of the network and its changes. Any thread.
 ///
-/// Whatever follows the network calls `set`; tests do so by hand.
+/// A subclass that follows the network calls `set`; tests call it by hand.
 class NetworkStatus {
 public:
     using Handler = std::function<void(const NetworkState&)>;
-    /// Ends the observation when it is destroyed; a call that is under way may end after that. May outlive the status.
+    /// Ends the observation when destroyed; a running call may end later. May outlive the status.
     using Token = std::shared_ptr<const Handler>;
 
-    /// `begin` sets following the network in motion; it is called when someone asks for the first time.
+    /// `begin` starts following the network; it is called by the first `current` or `observe`.
     explicit NetworkStatus(std::function<void()> begin = {}) : _begin(std::move(begin)) {}
     virtual ~NetworkStatus() = default;
 
-    /// Nothing until the source has answered, which takes it half a minute at most.
+    /// Returns nothing until the source has answered, within half a minute.
     [[nodiscard]] std::optional<NetworkState> current();
-    /// Calls `handler` for every change from now on, on the thread that sets it: it must only hand work on.
+    /// Calls `handler` with every change from now on, on the thread that calls `set`. It must only hand work on.
     [[nodiscard]] Token observe(Handler handler);
     void set(const NetworkState& state);
 

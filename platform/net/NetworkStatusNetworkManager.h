@@ -9,11 +9,11 @@ namespace platform {
 
 class RunLoop;
 
-/// The status that NetworkManager tells over the system bus, connected to when someone asks. Without NetworkManager or
-/// system bus: online and unmetered. The run loop must outlive it; made and destroyed on its thread.
+/// Follows NetworkManager over the system bus, from the first request on. Without NetworkManager or a system bus the
+/// network counts as online and unmetered. Made and destroyed on the run loop's thread; the run loop must outlive it.
 [[nodiscard]] std::unique_ptr<NetworkStatus> makeNetworkManagerStatus(RunLoop& runLoop);
 
-/// What NetworkManager's properties "State" (NMState) and "Metered" (NMMetered) mean.
+/// Translates NetworkManager's properties "State" (NMState) and "Metered" (NMMetered).
 [[nodiscard]] NetworkState networkStateOf(std::uint32_t state, std::uint32_t metered);
 
 } // namespace platform

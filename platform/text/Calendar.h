@@ -7,7 +7,8 @@
 
 namespace platform {
 
-/// The day of `date` in a time zone (an IANA name; an unknown one is UTC), counted from 1970-01-01. Any thread.
+/// Returns the day of `date` in a time zone, counted from 1970-01-01. `timeZone` is an IANA name; an unknown one means
+/// UTC. Any thread.
 [[nodiscard]] std::int64_t localDay(Date date, std::string_view timeZone);
 
 } // namespace platform

@@ -114,7 +114,7 @@ std::vector<std::string> WordFinder::wordsIn(std::string_view text)
     whole.toUTF8String(utf8);
     std::size_t byte = 0;
     int32_t unit = 0;
-    const auto byteOf = [&](int32_t end) { // of a place that isn't before the last one
+    const auto byteOf = [&](int32_t end) { // calls must not go back
         for (; unit < end; byte += static_cast<std::size_t>(U8_COUNT_TRAIL_BYTES(utf8[byte])) + 1)
             unit += static_cast<unsigned char>(utf8[byte]) < 0xf0 ? 1 : 2;
         return byte;

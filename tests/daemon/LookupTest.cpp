@@ -168,7 +168,7 @@ TEST(LookupFilter, KeepsResultsWhoseKeywordsCompletionAndSubjectFit)
     Lookup::filterLookupResultsWithRequest(request, array, "");
     Lookup::filterLookupResultsWithRequest(request, text, "");
     EXPECT_EQ(log.count("no data to process for lookup response"), 1);
-    EXPECT_EQ(log.count("lookup response is not an array. who knows what this is: \"xxx"), 1);
+    EXPECT_EQ(log.count("lookup response is not an array. who knows what this is: <private>"), 1);
 }
 
 } // namespace

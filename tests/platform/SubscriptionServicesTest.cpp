@@ -78,7 +78,7 @@ TEST(Subscriptions, AreReadFromSoundFilesAndWatched)
 
     for (int i = 0; i < 100; ++i) write(fmt::format("many-{}.json", i), "{}");
     EXPECT_TRUE(subscriptions->activeServices(query));
-    EXPECT_TRUE(log.count("subscription files 64 are read"));
+    EXPECT_TRUE(log.count("subscription files, 64 are read"));
     const auto notThere = makeSubscriptionServices(*files, directory / "app/subscriptions.d/notes.txt", loop, clock);
     EXPECT_FALSE(notThere->activeServices(query)) << "a file in place of the directory";
 }
