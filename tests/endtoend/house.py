@@ -1,0 +1,199 @@
+"""What every end-to-end case runs against: a search service, a daemon and its clients, on private directories.
+
+BUILD is the build directory that the programs come from; build/dev if it is not set.
+"""
+import json
+import os
+import pathlib
+import re
+import signal
+import subprocess
+import sys
+import tempfile
+import threading
+import time
+import urllib.request
+
+BUILD = pathlib.Path(os.environ.get("BUILD", pathlib.Path(__file__).parents[2] / "build/dev"))
+TAVRIND = BUILD / "tavrind/tavrind"
+TAVRINCTL = BUILD / "tools/tavrinctl/tavrinctl"
+DEVSERVER = BUILD / "tools/devserver/tavrin-devserver"
+REPLAY = BUILD / "tools/replay/tavrin-replay"
+TIMEOUT = 60  # seconds for anything to happen, on a busy machine
+
+
+class Failure(Exception):
+    """A program did something else than it should."""
+
+
+def check(holds, what):
+    if not holds:
+        raise Failure(what)
+
+
+class Log:
+    """The lines that the programs write, as they come. Any thread."""
+
+    def __init__(self):
+        self.lines, self.changed = [], threading.Condition()
+
+    def add(self, line):
+        with self.changed:
+            self.lines.append(line)
+            self.changed.notify_all()
+
+    def pump(self, stream):
+        """Reads the stream to its end on a thread, which is returned."""
+        def read():
+            for line in stream:
+                self.add(line.decode(errors="replace").rstrip("\n"))
+        thread = threading.Thread(target=read, daemon=True)
+        thread.start()
+        return thread
+
+    def has(self, pattern):
+        with self.changed:
+            return any(re.search(pattern, line) for line in self.lines)
+
+
+class House:
+    def __init__(self, home):
+        self.home = pathlib.Path(home)
+        self.environment = dict(os.environ, TERM="xterm")
+        for name in ["RUNTIME_DIR", "CONFIG_HOME", "CACHE_HOME", "STATE_HOME", "DATA_HOME", "DATA_DIRS"]:
+            self.environment["XDG_" + name] = self.directory(name.lower())
+        self.environment["TMPDIR"] = self.directory("tmp")
+        self.cache = self.home / "cache_home/com.quorvane.tavrind"
+        self.config = self.home / "config_home"
+        self.log = Log()
+        self.daemon = None
+        self.service = subprocess.Popen([DEVSERVER, "--http-port", "0", "--https-port", "0", "--cert-dir",
+                                         self.home / "certificate", "--quiet"], stdout=subprocess.PIPE,
+                                        stderr=subprocess.PIPE)
+        self.log.pump(self.service.stderr)
+        ready = json.loads(self.service.stdout.readline())
+        self.http, self.https, self.certificate = ready["http"], ready["https"], ready["ca"]
+        self.environment["SSL_CERT_FILE"] = self.certificate
+        self.ctl("defaults", "write", "TAVBagURL", self.https + "/bag")
+
+    def directory(self, name):
+        (self.home / name).mkdir(mode=0o700, exist_ok=True)
+        return str(self.home / name)
+
+    # ---- The daemon
+
+    def socket(self):
+        return pathlib.Path(self.environment["XDG_RUNTIME_DIR"], "com.quorvane.tavrind/socket")
+
+    def start_daemon(self, log_level="info"):
+        """Holds the socket, as systemd's socket units do; the daemon starts with its first client."""
+        self.socket().parent.mkdir(mode=0o700, exist_ok=True)
+        passed_on = [f"-E{name}" for name in self.environment if re.match("XDG_|SSL_|TMPDIR|.*SAN_OPTIONS", name)]
+        self.daemon = subprocess.Popen(["systemd-socket-activate", f"--listen={self.socket()}", *passed_on,
+                                        TAVRIND, "--log-level", log_level],
+                                       env=self.environment, stderr=subprocess.PIPE)
+        line = self.daemon.stderr.readline()
+        check(b"istening" in line, f"systemd-socket-activate: {line}")
+        self.reader = self.log.pump(self.daemon.stderr)
+
+    def stop_daemon(self, how=signal.SIGTERM):
+        if not self.daemon:
+            return
+        daemon, self.daemon = self.daemon, None
+        daemon.send_signal(how)
+        status = daemon.wait()
+        self.reader.join()
+        check(status == 0 or how == signal.SIGKILL, f"the daemon ended with status {status}")
+
+    def pid(self):
+        return self.json("status").get("pid")
+
+    # ---- Clients
+
+    def spawn(self, *arguments, **options):
+        """A tavrinctl in the background."""
+        return subprocess.Popen([TAVRINCTL, "--timeout", "60", *arguments], env=self.environment, **options)
+
+    def ctl(self, *arguments, **options):
+        """A tavrinctl to its end: `returncode`, `stdout`, `stderr`."""
+        done = subprocess.run([TAVRINCTL, "--timeout", "20", *arguments], env=self.environment,
+                              capture_output=True, check=False, **options)
+        self.log.add("tavrinctl: " + done.stderr.decode(errors="replace"))
+        return done
+
+    def json(self, *arguments, **options):
+        """What `tavrinctl --json` prints; empty if it prints nothing."""
+        return json.loads(self.ctl("--json", *arguments, **options).stdout or b"{}")
+
+    def outcome(self, query="weather"):
+        return self.json("search", query).get("outcome")
+
+    def answered(self):
+        """If a search is answered within five. Each waits a second for the bag, which a busy machine may take longer for."""
+        return any(self.outcome() == "answered" for _ in range(5))
+
+    def books(self):
+        """The feedback counters. Every recorded event is in one place, or was dropped for a reason."""
+        books = self.json("status")["feedback"]
+        places = sum(books[place] for place in ("open", "closed", "uploading", "sent", "notSent", "unknown"))
+        check(books["recorded"] == places + sum(books["dropped"].values()), f"the books don't close: {books}")
+        return books
+
+    # ---- The service
+
+    def control(self, call, body=None, post=False):
+        """The JSON of a control call: a POST if there is a body."""
+        data = json.dumps(body).encode() if body is not None else b"" if post else None
+        request = urllib.request.Request(f"{self.http}/control/{call}", data, {"Content-Type": "application/json"})
+        with urllib.request.urlopen(request, timeout=TIMEOUT) as reply:
+            return json.load(reply)
+
+    def fault(self, endpoint, fault, count=0):
+        self.control("faults", {"endpoint": endpoint, "fault": fault, "count": count})
+
+    def clear_faults(self):
+        self.control("faults/clear", post=True)
+        self.control("release", post=True)
+
+    def requests(self, endpoint):
+        return self.control("status")["by_endpoint"].get(endpoint, 0)
+
+    # ---- Waiting
+
+    def soon(self, holds, what):
+        """Waits until `holds()`: tried after each line of the log, and ten times a second."""
+        end = time.monotonic() + TIMEOUT
+        while not (result := holds()):
+            check(time.monotonic() < end, what() if callable(what) else what)
+            with self.log.changed:
+                self.log.changed.wait(0.1)
+        return result
+
+    def stop_service(self):
+        """SIGTERM ends the service at once, with idle and held connections."""
+        self.service.terminate()
+        status = self.service.wait(TIMEOUT)
+        check(status == 0, f"the service ended with status {status}")
+
+    def end(self):
+        for process in filter(None, (self.daemon, self.service)):
+            process.kill()
+            process.wait()
+
+
+def run(case):
+    """Runs the case in a house of its own. The status is 0 if all held and no sanitizer complained."""
+    for number in (signal.SIGTERM, signal.SIGHUP):
+        signal.signal(number, lambda *_: sys.exit(1))
+    with tempfile.TemporaryDirectory(ignore_cleanup_errors=True) as home:
+        house = House(home)
+        try:
+            case(house)
+            house.stop_service()
+            house.stop_daemon()
+            check(not house.log.has("runtime error|AddressSanitizer|ThreadSanitizer"), "a sanitizer complained")
+        except Failure as failure:
+            sys.stdout.flush()
+            sys.exit("\n".join(house.log.lines[-40:]) + f"\nFAILED: {failure}")
+        finally:
+            house.end()
