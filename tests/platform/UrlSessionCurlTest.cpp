@@ -10,9 +10,9 @@
 #include <fmt/format.h>
 #include <gtest/gtest.h>
 
-#include "platform/files/Files.h"
 #include "platform/net/CurlSupport.h"
 #include "platform/net/UrlSession.h"
+#include "tests/support/TemporaryDirectory.h"
 #include "tests/support/TestHttpServer.h"
 #include "tests/support/UrlLoads.h"
 
@@ -386,11 +386,13 @@ TEST_F(CurlLoaderTest, RequestsThatCannotBeSentAreErrors)
 
 TEST_F(CurlLoaderTest, CertificatesAreCheckedAndSessionsResumedWhereAllowed)
 {
-    TestHttpServer server(always({httpAnswer(200, "safe"), Then::Close}), {.tls = true});
+    const test::TemporaryDirectory directory;
+    const auto certificate =
+        tavrin::tools::provideCertificate(directory / "certificate", "127.0.0.1", std::chrono::system_clock::now());
+    TestHttpServer server(always({httpAnswer(200, "safe"), Then::Close}), {.certificate = certificate.value()});
     EXPECT_EQ(load(server.url()).code(), kUrlTlsFailed) << "nobody vouches for it";
 
-    const std::string caFile = testing::TempDir() + fmt::format("loader-{}.pem", getpid());
-    ASSERT_TRUE(makeSystemFiles()->writeAtomically(caFile, server.certificate()));
+    const std::string caFile = certificate->certificate;
     for (const bool tickets : {false, true}) {
         loader = makeCurlLoader();
         for (const bool second : {false, true}) {
@@ -400,7 +402,6 @@ TEST_F(CurlLoaderTest, CertificatesAreCheckedAndSessionsResumedWhereAllowed)
             EXPECT_GT(outcome.timing["_kCFNTimingDataSecureConnectionStart"].asDouble(), 0.0);
         }
     }
-    unlink(caFile.c_str());
 }
 
 // ---- cancelling and ending ----

@@ -13,11 +13,7 @@
 
 #include <fmt/format.h>
 #include <gtest/gtest.h>
-#include <openssl/bio.h>
-#include <openssl/evp.h>
-#include <openssl/pem.h>
 #include <openssl/ssl.h>
-#include <openssl/x509v3.h>
 
 #include "platform/files/Files.h"
 
@@ -30,37 +26,12 @@ template <auto Free> struct FreeWith {
 };
 using SslContext = std::unique_ptr<SSL_CTX, FreeWith<SSL_CTX_free>>;
 using Ssl = std::unique_ptr<SSL, FreeWith<SSL_free>>;
-using Key = std::unique_ptr<EVP_PKEY, FreeWith<EVP_PKEY_free>>;
-using Certificate = std::unique_ptr<X509, FreeWith<X509_free>>;
 
-/// A context with a new key and a certificate for the address; `pem` gets the certificate.
-SslContext makeTls(const std::string& address, std::string& pem)
+SslContext makeTls(const tavrin::tools::CertificateFiles& files)
 {
-    const Key key(EVP_EC_gen("P-256"));
-    const Certificate certificate(X509_new());
-    X509* x509 = certificate.get();
-    X509_set_version(x509, X509_VERSION_3);
-    ASN1_INTEGER_set(X509_get_serialNumber(x509), 1);
-    X509_gmtime_adj(X509_getm_notBefore(x509), -3600);
-    X509_gmtime_adj(X509_getm_notAfter(x509), 3600);
-    X509_set_pubkey(x509, key.get());
-    X509_NAME_add_entry_by_txt(X509_get_subject_name(x509), "CN", MBSTRING_ASC,
-                               reinterpret_cast<const unsigned char*>("test"), -1, -1, 0);
-    X509_set_issuer_name(x509, X509_get_subject_name(x509));
-    const std::unique_ptr<X509_EXTENSION, FreeWith<X509_EXTENSION_free>> name(
-        X509V3_EXT_conf_nid(nullptr, nullptr, NID_subject_alt_name, ("IP:" + address).c_str()));
-    X509_add_ext(x509, name.get(), -1);
-    X509_sign(x509, key.get(), EVP_sha256());
-
-    const std::unique_ptr<BIO, FreeWith<BIO_free_all>> text(BIO_new(BIO_s_mem()));
-    PEM_write_bio_X509(text.get(), x509);
-    char* data = nullptr;
-    const long size = BIO_get_mem_data(text.get(), &data);
-    pem.assign(data, static_cast<std::size_t>(size));
-
     SslContext context(SSL_CTX_new(TLS_server_method()));
-    SSL_CTX_use_certificate(context.get(), x509);
-    SSL_CTX_use_PrivateKey(context.get(), key.get());
+    SSL_CTX_use_certificate_file(context.get(), files.certificate.c_str(), SSL_FILETYPE_PEM);
+    SSL_CTX_use_PrivateKey_file(context.get(), files.key.c_str(), SSL_FILETYPE_PEM);
     return context;
 }
 
@@ -107,7 +78,6 @@ struct TestHttpServer::Impl {
     FileHandle listener;
     FileHandle wake{eventfd(0, EFD_CLOEXEC)};
     std::uint16_t port = 0;
-    std::string certificate;
     SslContext tls;
     std::map<int, Connection> open; // by descriptor; server's thread
 
@@ -221,7 +191,7 @@ TestHttpServer::TestHttpServer(Handler handler, const Options& options) : _impl(
 {
     _impl->handler = std::move(handler);
     _impl->options = options;
-    if (options.tls) _impl->tls = makeTls(options.address, _impl->certificate);
+    if (options.certificate) _impl->tls = makeTls(*options.certificate);
     _impl->listen();
     _impl->thread = std::thread([impl = _impl.get()] { impl->run(); });
 }
@@ -243,11 +213,6 @@ Url TestHttpServer::url(std::string_view target) const
 std::uint16_t TestHttpServer::port() const
 {
     return _impl->port;
-}
-
-const std::string& TestHttpServer::certificate() const
-{
-    return _impl->certificate;
 }
 
 int TestHttpServer::connections() const

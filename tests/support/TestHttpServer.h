@@ -6,11 +6,13 @@
 #include <map>
 #include <memory>
 #include <mutex>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
 
 #include "platform/net/Url.h"
+#include "tools/shared/Certificate.h"
 
 namespace platform::test {
 
@@ -40,8 +42,8 @@ public:
     using Handler = std::function<Answer(const Request&)>;
 
     struct Options {
-        std::string address = "127.0.0.1"; ///< IPv4 or IPv6
-        bool tls = false;                  ///< with a certificate made for `address`, signed by itself
+        std::string address = "127.0.0.1";                            ///< IPv4 or IPv6
+        std::optional<tavrin::tools::CertificateFiles> certificate{}; ///< if set, the server speaks TLS
     };
 
     explicit TestHttpServer(Handler handler);
@@ -50,8 +52,6 @@ public:
 
     [[nodiscard]] Url url(std::string_view target = "/") const;
     [[nodiscard]] std::uint16_t port() const;
-    /// The server's certificate, PEM.
-    [[nodiscard]] const std::string& certificate() const;
     [[nodiscard]] int connections() const;
     [[nodiscard]] std::vector<Request> requests() const;
     /// Blocks until `count` requests have been read in all.

@@ -103,7 +103,7 @@ struct HttpServer::Implementation {
     std::atomic<bool> ended = false;
 };
 
-HttpServer::HttpServer(std::optional<CertificateFiles> certificate)
+HttpServer::HttpServer(std::optional<tavrin::tools::CertificateFiles> certificate)
     : _implementation(std::make_unique<Implementation>())
 {
     Implementation& self = *_implementation;

@@ -6,8 +6,8 @@
 #include <optional>
 #include <string>
 
-#include "tools/devserver/Certificate.h"
 #include "tools/devserver/Http.h"
+#include "tools/shared/Certificate.h"
 
 namespace devserver {
 
@@ -20,7 +20,7 @@ public:
     using Handler = std::function<Answer(const Request&)>;
 
     /// Without a certificate plain HTTP.
-    explicit HttpServer(std::optional<CertificateFiles> certificate = {});
+    explicit HttpServer(std::optional<tavrin::tools::CertificateFiles> certificate = {});
     /// Stops.
     ~HttpServer();
 

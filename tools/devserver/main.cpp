@@ -12,10 +12,10 @@
 #include "platform/values/Error.h"
 #include "platform/values/Json.h"
 #include "platform/values/Value.h"
-#include "tools/devserver/Certificate.h"
 #include "tools/devserver/HttpServer.h"
 #include "tools/devserver/Options.h"
 #include "tools/devserver/Service.h"
+#include "tools/shared/Certificate.h"
 
 namespace {
 
@@ -51,8 +51,8 @@ void printUpload(const std::string& line)
 
 std::expected<void, std::string> run(const Options& options, const sigset_t& signals)
 {
-    const auto certificate =
-        provideCertificate(options.certificateDirectory, options.address, std::chrono::system_clock::now());
+    const auto certificate = tavrin::tools::provideCertificate(options.certificateDirectory, options.address,
+                                                               std::chrono::system_clock::now());
     if (!certificate) return std::unexpected(certificate.error());
 
     if (!options.readyFile.empty()) { // one that an earlier run left would name the wrong addresses

@@ -1,4 +1,4 @@
-#include "tools/devserver/Certificate.h"
+#include "tools/shared/Certificate.h"
 
 #include <arpa/inet.h>
 #include <memory>
@@ -13,7 +13,7 @@
 
 #include "platform/files/Files.h"
 
-namespace devserver {
+namespace tavrin::tools {
 namespace {
 
 constexpr std::chrono::hours kRenewBefore{24};
@@ -93,7 +93,7 @@ CertificatePtr makeCertificate(EVP_PKEY* key, const std::string& address, platfo
     std::uint64_t serial = 0;
     RAND_bytes(reinterpret_cast<unsigned char*>(&serial), sizeof serial);
     ASN1_INTEGER_set_uint64(X509_get_serialNumber(certificate.get()), serial >> 1);
-    // A little into the past, for clients whose clock is behind.
+    // One hour in the past for clients whose clock is slow.
     ASN1_TIME_set(X509_getm_notBefore(certificate.get()), seconds(now - std::chrono::hours(1)));
     ASN1_TIME_set(X509_getm_notAfter(certificate.get()), seconds(now + lifetime));
     X509_NAME* name = X509_get_subject_name(certificate.get());
@@ -123,8 +123,8 @@ std::expected<CertificateFiles, std::string> provideCertificate(const std::files
     const auto fileSystem = platform::makeSystemFiles();
     CertificateFiles files{directory / "cert.pem", directory / "key.pem", false};
     if (const auto made = fileSystem->createDirectories(directory); !made)
-        return std::unexpected(
-            fmt::format("can't make {}: {}; give another with --cert-dir", directory.string(), made.error().reason()));
+        return std::unexpected(fmt::format("can't create {}: {}; choose another directory with --cert-dir",
+                                           directory.string(), made.error().reason()));
     if (isUsable(files, *fileSystem, address, now)) return files;
 
     const KeyPtr key(EVP_EC_gen("P-256"));
@@ -134,7 +134,7 @@ std::expected<CertificateFiles, std::string> provideCertificate(const std::files
     if (!certificate || !PEM_write_bio_X509(certificateText.get(), certificate.get()) ||
         !PEM_write_bio_PrivateKey(keyText.get(), key.get(), nullptr, nullptr, 0, nullptr, nullptr))
         return std::unexpected(fmt::format("can't make a certificate for \"{}\"", address));
-    // Key first: should writing stop in between, the pair doesn't fit and is made again.
+    // Key first: if writing is interrupted, the pair does not match and is made again.
     for (const auto& [path, bio] :
          {std::pair(files.key, keyText.get()), std::pair(files.certificate, certificateText.get())})
         if (const auto written = fileSystem->writeAtomically(path, contents(bio)); !written)
@@ -143,4 +143,4 @@ std::expected<CertificateFiles, std::string> provideCertificate(const std::files
     return files;
 }
 
-} // namespace devserver
+} // namespace tavrin::tools
