@@ -1,11 +1,9 @@
 #include "tools/devserver/Bag.h"
 
-#include <map>
 #include <set>
 
 #include <gtest/gtest.h>
 
-#include "CoreTavrin/TAVBag.h"
 #include "platform/values/Dictionary.h"
 #include "platform/values/Error.h"
 #include "platform/values/Json.h"
@@ -19,21 +17,6 @@ using platform::Value;
 Value json(std::string_view text)
 {
     return platform::parseJson(text).value();
-}
-
-TEST(Bag, TheDaemonReadsEveryKeyThatIsServed)
-{
-    const Bag served("https://127.0.0.1:8443");
-    const tavrin::TAVBag bag(served.document(), "tester/1.0");
-    EXPECT_EQ(bag.problems(), std::vector<std::string>());
-    EXPECT_EQ(bag.version(), "1");
-    EXPECT_EQ(bag.minimumQueryLength(), 2u);
-    EXPECT_EQ(bag.searchURL()->string(), "https://127.0.0.1:8443/search");
-    EXPECT_EQ(bag.urlForIdentifier("a/b")->string(), "https://127.0.0.1:8443/images/a%2Fb");
-    for (const auto& url : {bag.warmURL(), bag.flightURL(), bag.feedbackURL(), bag.crowdsourcingURL()})
-        EXPECT_TRUE(url);
-    for (const auto name : tavrin::kTAVResourceIdentifiers)
-        EXPECT_EQ(bag.resourceURL(name)->queryValue("version"), "1") << name;
 }
 
 TEST(Bag, OverridesAddReplaceAndRemoveKeys)
@@ -66,23 +49,6 @@ TEST(Bag, TheVersionOnlyCountsUp)
     EXPECT_EQ(bag.document()["version"], Value(50)) << "a number ends the override";
 }
 
-TEST(Bag, ResourcesHaveVersionsOfTheirOwn)
-{
-    Bag bag("https://h");
-    const auto versions = [&] {
-        std::map<std::string, int> resources;
-        for (const auto name : tavrin::kTAVResourceIdentifiers)
-            ++resources[tavrin::TAVBag(bag.document(), "a").resourceURL(name)->queryValue("version").value_or("")];
-        return resources;
-    };
-    EXPECT_EQ(bag.bumpResources("TAVQIFeatures"), 2);
-    EXPECT_EQ(bag.bumpResources("TAVQIFeatures"), 3);
-    EXPECT_EQ(versions(), (std::map<std::string, int>{{"1", 9}, {"3", 1}}));
-    EXPECT_FALSE(bag.bumpResources("Nothing"));
-    EXPECT_EQ(bag.bumpResources(), 4) << "every one has a version that it didn't have";
-    EXPECT_EQ(versions(), (std::map<std::string, int>{{"4", 10}}));
-}
-
 TEST(Resources, TheVersionAtHandIsNotSentAgain)
 {
     Request request;
@@ -104,18 +70,6 @@ TEST(Resources, TheVersionAtHandIsNotSentAgain)
     }
     for (const char* path : {"", "Nothing", "hints/1/TAVQIFeatures", "hints/1", "hints//TAVLookupHintsWeekly"})
         EXPECT_EQ(resourceAnswer("https://h", path, {}).status, 404) << path;
-}
-
-TEST(Resources, LookupHintsRedirectToAPathWithTheirVersion)
-{
-    Request request;
-    request.query = "version=2";
-    const Answer redirect = resourceAnswer("https://h", "TAVLookupHintsWeekly", request);
-    ASSERT_EQ(redirect.status, 302);
-    EXPECT_EQ(*findHeader(redirect.headers, "Location"), "https://h/resources/hints/2/TAVLookupHintsWeekly");
-    request.headers = {{"If-None-Match", "2-TAVLookupHintsWeekly-hints"}};
-    EXPECT_EQ(resourceAnswer("https://h", "hints/2/TAVLookupHintsWeekly", request).status, 304);
-    EXPECT_EQ(resourceAnswer("https://h", "hints/3/TAVLookupHintsWeekly", request).status, 200);
 }
 
 TEST(Resources, TheAllowListIsJsonInsideJson)

@@ -55,28 +55,5 @@ TEST(Fold, CaseMarksWidthAndBlanksMakeNoDifference)
     }
 }
 
-TEST(Fold, SourceNamesTheCharacterThatAByteCameFrom)
-{
-    const Folded folded = fold("aßü!"); // bytes: a 0, ß 1, ü 3, ! 5
-    EXPECT_EQ(folded.text, "assu!");
-    EXPECT_EQ(folded.source, (std::vector<std::uint32_t>{0, 1, 1, 3, 5, 6}));
-}
-
-TEST(Fold, WordsAreFoundInEveryScript)
-{
-    const std::pair<const char*, std::vector<std::string>> cases[] = {
-        {"shepherd's pie, twice", {"shepherd's", "pie", "twice"}},
-        {"東京の朝", {"東京", "の", "朝"}},
-        {"برج القاهرة", {"برج", "القاهرة"}},
-        {"🎧 mixdesk", {"🎧", "mixdesk"}},
-        {" – ", {}},
-    };
-    for (const auto& [text, expected] : cases) {
-        std::vector<std::string> words;
-        for (const Word& word : wordsOf(text)) words.emplace_back(text + word.begin, text + word.end);
-        EXPECT_EQ(words, expected) << text;
-    }
-}
-
 } // namespace
 } // namespace devserver

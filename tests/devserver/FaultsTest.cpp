@@ -49,15 +49,6 @@ TEST(Faults, CountedRulesEndAndOthersStay)
     EXPECT_TRUE(faults.take("search").empty());
 }
 
-TEST(Faults, RefusesUnknownEndpointsAndMoreRulesThanItKeeps)
-{
-    Faults faults;
-    EXPECT_FALSE(faults.add("serch", "cut", 1));
-    EXPECT_FALSE(faults.add("control", "cut", 1));
-    for (std::size_t i = 0; i < Faults::kMaximumCount; ++i) ASSERT_TRUE(faults.add("bag", "cut", 1));
-    EXPECT_FALSE(faults.add("bag", "cut", 1));
-}
-
 Answer spoilt(std::string_view fault, std::string body)
 {
     Answer answer{.body = std::move(body)};

@@ -115,30 +115,6 @@ TEST(HttpServer, ATakenPortIsAnError)
     EXPECT_EQ(second.bind("127.0.0.1", port), std::unexpected(std::string("taken")));
 }
 
-TEST(HttpServer, StoppingEndsIdleAndHeldConnections)
-{
-    Gate gate;
-    std::promise<void> held;
-    HttpServer server;
-    const int port = server.bind("127.0.0.1", 0).value();
-    server.start([&](const Request& request) {
-        if (request.path == "/held") {
-            held.set_value();
-            gate.wait(std::nullopt, request.connection);
-        }
-        return Answer{.body = "ok"};
-    });
-    const platform::FileHandle idle = connectTo(port);
-    const platform::FileHandle waiting = connectTo(port);
-    const std::string request = "GET /held HTTP/1.1\r\nHost: h\r\n\r\n";
-    send(waiting.fd(), request.data(), request.size(), 0);
-    held.get_future().wait();
-    gate.close();
-    server.stop(); // the test's time limit is the check
-    char byte = 0;
-    EXPECT_LE(recv(idle.fd(), &byte, 1, 0), 0);
-}
-
 TEST(HttpServer, APeerThatLeavesEndsItsWait)
 {
     Gate gate;

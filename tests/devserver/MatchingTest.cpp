@@ -1,7 +1,5 @@
 #include "tools/devserver/Matching.h"
 
-#include <set>
-
 #include <gtest/gtest.h>
 
 #include "tools/devserver/SearchAnswers.h"
@@ -103,56 +101,6 @@ TEST_F(Answers, EverySetIsFoundAgainByWhatWasTyped)
             EXPECT_GT(set["completion_score"].asDouble().value_or(0), 0);
         }
     }
-}
-
-TEST_F(Answers, SuggestionsNeverEchoTheQuery)
-{
-    std::size_t count = 0;
-    for (const char* typed : {"weather", "weather zürich", "Zürich", "東京"}) {
-        const auto sets = answers.search(typed);
-        for (const auto& set : *sets.asArray()) {
-            for (const auto& suggestion : *set["suggestions"].asArray())
-                EXPECT_NE(*suggestion["suggestion"].asString(), lowerCased(typed));
-            count += set["suggestions"].count();
-        }
-    }
-    EXPECT_GT(count, 5u);
-    EXPECT_EQ(answers.search("weather", false)[0]["suggestions"].count(), 0u);
-}
-
-TEST_F(Answers, MoreResultsGoOnWhereTheSectionEnded)
-{
-    std::set<std::string> seen;
-    const auto first = answers.search("weather");
-    for (const auto& result : *first[0]["results"].asArray())
-        if (*result["section_name"].asString() == "Weather") seen.insert(*result["identifier"].asString());
-    const Section& section = *findSection("weather");
-    std::size_t offset = seen.size();
-    for (;;) {
-        const auto page = answers.moreResults("weather", section, offset);
-        for (const auto& result : *page[0]["results"].asArray())
-            EXPECT_TRUE(seen.insert(*result["identifier"].asString()).second) << "shown twice";
-        offset += page[0]["results"].count();
-        if (page[0]["more_results_url"].isNull()) break;
-    }
-    EXPECT_EQ(seen.size(), findMatches(catalogue, "weather", &section).size());
-    EXPECT_EQ(answers.moreResults("weather", section, SIZE_MAX)[0]["results"].count(), 0u);
-}
-
-TEST_F(Answers, NothingFoundIsOneEmptySetThatIsNotCached)
-{
-    const auto sets = answers.search("xyzzy");
-    ASSERT_EQ(sets.count(), 1u);
-    EXPECT_EQ(sets[0]["results"].count(), 0u);
-    EXPECT_TRUE(sets[0]["query"].isNull());
-}
-
-TEST(PartialAddress, LeavesTheLastPartOut)
-{
-    EXPECT_EQ(partialAddress("192.0.2.7"), "192.0.2.0");
-    EXPECT_EQ(partialAddress("2001:db8:1:2::7"), "2001:db8:1::");
-    EXPECT_EQ(partialAddress("::1"), "::");
-    EXPECT_EQ(partialAddress(""), "");
 }
 
 } // namespace

@@ -140,19 +140,5 @@ TEST(Uploads, RepeatsAreCountedAndEventsAreNot)
     EXPECT_EQ(service.uploads.totals()["received"], Value(0));
 }
 
-TEST(Uploads, WhatIsKeptIsBounded)
-{
-    Uploads uploads;
-    for (std::size_t i = 0; i < Uploads::kDigests + 1; ++i) {
-        Upload upload{.digest = std::to_string(i), .digestFits = true};
-        static_cast<void>(uploads.add(std::move(upload), Answer()));
-    }
-    static_cast<void>(uploads.add({.digest = "0", .digestFits = true}, Answer()));
-    EXPECT_EQ(uploads.list().count(), Uploads::kKept);
-    EXPECT_EQ(uploads.totals()["repeats"], Value(0)) << "the oldest digest is forgotten";
-    static_cast<void>(uploads.add({.digest = "2", .digestFits = true}, Answer()));
-    EXPECT_EQ(uploads.totals()["repeats"], Value(1));
-}
-
 } // namespace
 } // namespace devserver
