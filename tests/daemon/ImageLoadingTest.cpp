@@ -511,60 +511,6 @@ struct ImageFaults : ImageLoadingTest {
     std::shared_ptr<platform::UrlSession> fakeSession; // has requests of the fixture's
 };
 
-TEST_F(ImageFaults, EachLeavesItsOwnImageOut)
-{
-    TestHttpServer elsewhere(platform::test::always({httpAnswer(200, "from elsewhere")}), {.address = "127.0.0.2"});
-    std::map<std::string, TestHttpServer::Answer> answers{
-        {"/good", {httpAnswer(200, "pixels")}},
-        {"/short", {"HTTP/1.1 200 OK\r\nContent-Length: 90\r\n\r\npixels", TestHttpServer::Then::Close}},
-        {"/reset", {"HTTP/1.1 200 OK\r\nContent-Length: 90\r\n\r\npixels", TestHttpServer::Then::Reset}},
-        {"/long", {"HTTP/1.1 200 OK\r\nContent-Length: 3\r\n\r\npixels", TestHttpServer::Then::Close}},
-        {"/html", {httpAnswer(200, "<html></html>", "Content-Type: text/html\r\n")}},
-        {"/empty", {httpAnswer(200, "")}},
-        {"/nobody", {"HTTP/1.1 200 OK\r\n\r\n", TestHttpServer::Then::Close}},
-        {"/partial", {httpAnswer(206, "pix")}},
-        {"/nohttp", {"pixels\r\n", TestHttpServer::Then::Close}},
-        {"/moved", {httpAnswer(302, "moved", "Location: " + elsewhere.url("/x").string() + "\r\n")}},
-        {"/ftp", {httpAnswer(302, "", "Location: ftp://127.0.0.1/x\r\n")}},
-        {"/loop", {httpAnswer(302, "", "Location: /loop\r\n")}},
-        {"/huge", {"HTTP/1.1 200 OK\r\nContent-Length: 10485761\r\n\r\n" + std::string((10u << 20) + 1, 'x')}},
-    };
-    TestHttpServer server(platform::test::byPath(answers));
-    Value::Array images;
-    for (const auto& [path, answer] : answers) images.push_back(image(server.url(path).string()));
-    auto call = load(images, 60'000'000'000);
-    ASSERT_TRUE(answered(*call));
-    Strings loaded;
-    for (const auto& [url, bytes] : *call->argument(0).asDictionary())
-        loaded.push_back(fmt::format("{} {}", Url::parse(url)->path(), bytes.asBytes()->view()));
-    std::ranges::sort(loaded);
-    EXPECT_EQ(loaded, (Strings{"/good pixels", "/html <html></html>", "/long pix", "/moved from elsewhere"}));
-    ASSERT_EQ(elsewhere.requests().size(), 1u);
-
-    Strings errors;
-    for (const auto& record : session->records)
-        if (const auto error = std::dynamic_pointer_cast<ZRErrorFeedback>(record->feedback()))
-            errors.push_back(error->error->reason());
-    EXPECT_EQ(errors.size(), 8u) << "short, reset, empty, nobody, nohttp, ftp, loop, huge";
-}
-
-TEST_F(ImageFaults, WhatNeverEndsIsLeftOutAtTheLimit)
-{
-    TestHttpServer server(platform::test::byPath(
-        {{"/good", {httpAnswer(200, "pixels")}}, {"/endless", {"HTTP/1.1 200 OK\r\n\r\npixels and pixels and"}}}));
-    auto call = load({image(server.url("/endless").string()), image(server.url("/good").string())}, 3'000'000'000);
-    ASSERT_TRUE(device.executor.drainUntil([&] { return cached(server.url("/good").string()) == "pixels"; }));
-    server.waitForRequests(2);
-    EXPECT_TRUE(call->pending());
-    device.advance(3s);
-    ASSERT_TRUE(call->answered());
-    EXPECT_EQ(bytes(*call, server.url("/good").string()), "pixels");
-    EXPECT_EQ(call->argument(0).count(), 1u);
-    device.advance(5min);
-    EXPECT_TRUE(device.executor.drainUntil([&] { return device.transactions.open().empty(); }))
-        << "it is given up in the end";
-}
-
 TEST_F(ImageFaults, ManyImagesOfOneHostAllCome)
 {
     TestHttpServer server([](const TestHttpServer::Request& request) {

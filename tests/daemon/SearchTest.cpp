@@ -230,23 +230,6 @@ TEST_F(SearchTest, WaitsASecondForTheFirstBag)
     EXPECT_TRUE(search(*connection, 2, "weat")->pending());
 }
 
-TEST_F(SearchTest, FiveHundredWaitersEachHaveTheirSecond)
-{
-    startWithoutBag();
-    std::vector<std::shared_ptr<FakeConnection>> connections;
-    std::vector<std::shared_ptr<FakeCall>> calls;
-    for (int i = 0; i < 500; ++i) {
-        connections.push_back(client("com.quorvane.client" + std::to_string(i % 250), "C/1", 1000 + i));
-        device.advance(1ms);
-    }
-    device.advance(1s);
-    for (auto& connection : connections) calls.push_back(search(*connection, 1, "weat"));
-    device.advance(999ms);
-    for (auto& call : calls) EXPECT_TRUE(call->pending());
-    device.advance(1ms);
-    for (auto& call : calls) EXPECT_EQ(reasonOf(*call), "timeout");
-}
-
 TEST_F(SearchTest, TheBagsArrivalWakesEveryWaiterOfAClient)
 {
     startWithoutBag();

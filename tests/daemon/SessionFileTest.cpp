@@ -1,5 +1,4 @@
 #include <algorithm>
-#include <random>
 
 #include "platform/values/Archive.h"
 #include "platform/values/Dictionary.h"
@@ -114,30 +113,6 @@ TEST_F(SessionFileTest, CutAnywhereItGivesEveryWholeEventBeforeTheCut)
         const std::vector expected(inputs.begin(), inputs.begin() + static_cast<long>(recordsLeft) - 2);
         ASSERT_EQ(inputsIn(*session), expected) << cut;
         ASSERT_EQ(lost, 0u) << "half a record is no event that is known of";
-    }
-}
-
-TEST_F(SessionFileTest, FlippedBitsLoseNothingBeforeThem)
-{
-    start();
-    const std::vector<std::string> inputs{"a", "bb", "ccc", "dddd", "eeeee"};
-    const std::string whole = contents(closedFile(inputs)->fileUrl().filename());
-    const auto ends = recordEnds(whole);
-    std::mt19937 random(20261125);
-    for (int i = 0; i < 10'000; ++i) {
-        std::string damaged = whole;
-        std::size_t first = whole.size();
-        for (int flips = 1 + static_cast<int>(random() % 4); flips > 0; --flips) {
-            const std::size_t at = random() % whole.size();
-            damaged[at] = static_cast<char>(damaged[at] ^ (1 << random() % 8));
-            first = std::min(first, at);
-        }
-        const auto session = adopted(damaged)->read().session;
-        const auto intact = std::ranges::count_if(ends, [first](std::size_t end) { return end <= first; });
-        if (intact < 2) continue;
-        ASSERT_TRUE(session) << i;
-        const auto& all = session->feedbacks();
-        ASSERT_GE(static_cast<long>(all.size()), intact - 2) << i;
     }
 }
 

@@ -1,16 +1,12 @@
-// Users who type, over the whole road of a search: a corpus of real shape beside a model of the cache, and random
-// schedules of everything that can happen on the way.
+// Users who type, through every step of a search: random schedules of everything that can happen on the way.
 
 #include <cstdlib>
 #include <random>
-#include <set>
 
-#include "platform/files/Files.h"
+#include "platform/text/Text.h"
 #include "platform/values/Dictionary.h"
 #include "platform/values/Json.h"
-#include "tests/support/CacheModel.h"
 #include "tests/support/DaemonFixture.h"
-#include "tools/replay/Corpus.h"
 
 namespace tavrin::test {
 namespace {
@@ -41,92 +37,6 @@ struct TypingTest : DaemonTest {
         deliverBag();
     }
 };
-
-/// A service that completes what is typed to the next end of a word, with sets large enough to fill a cache.
-class Completions {
-public:
-    explicit Completions(const std::vector<replay::TypedQuery>& queries)
-    {
-        for (const auto& query : queries) _titles.insert(platform::lowerCased(query.wanted));
-    }
-    Value::Array answer(const std::string& typed)
-    {
-        const std::string lower = platform::lowerCased(typed);
-        std::set<std::string> completed;
-        for (auto title = _titles.lower_bound(lower); title != _titles.end() && title->starts_with(lower); ++title)
-            completed.insert(title->substr(0, title->find(' ', lower.size())));
-        Value::Array sets;
-        for (const std::string& query : completed) {
-            if (sets.size() == 3) break;
-            ++_serial;
-            sets.push_back(Value::dictionaryOf({{"query", query},
-                                                {"serial", _serial},
-                                                {"max_age", _serial % 5 ? 60 : 0},
-                                                {"completion_score", _serial % 4 - 1},
-                                                {"results", std::string(8000, 'r')}}));
-        }
-        return sets;
-    }
-
-private:
-    std::set<std::string> _titles;
-    int _serial = 0;
-};
-
-TEST_F(TypingTest, TheCorpusHitsWhatTheRulesSay)
-{
-    const auto corpus = platform::makeSystemFiles()->read(SOURCE_DIR "/tools/replay/corpus.txt", 1 << 20).value();
-    const auto queries = replay::parseCorpus(corpus.view()).value();
-    Completions service(queries);
-    CacheModel model;
-    const auto token = device.notifications.observe("TAVUserGUIDChangeNotification", [&](auto&) { model.clear(); });
-
-    auto connection = client();
-    std::int64_t queryId = 0;
-    int hits = 0, requests = 0;
-    struct UnderWay {
-        std::shared_ptr<Task> task;
-        std::string text;
-        platform::Date due;
-    };
-    std::vector<UnderWay> underWay;
-    const auto letPass = [&](platform::Duration time) {
-        const platform::Date end = device.clock.wallNow() + time;
-        while (!underWay.empty() && underWay.front().due <= end) {
-            device.advance(underWay.front().due - device.clock.wallNow());
-            const UnderWay done = std::move(underWay.front());
-            underWay.erase(underWay.begin());
-            const Value::Array sets = service.answer(done.text);
-            done.task->respond(200, platform::toJson(sets));
-            device.drain();
-            for (const Value& set : sets) model.put(done.text, 2, set, device.clock.wallNow());
-        }
-        device.advance(end - device.clock.wallNow());
-    };
-
-    for (const auto& query : queries) {
-        for (const auto& key : query.keys) {
-            letPass(key.pause);
-            if (platform::utf16Length(key.text) < 2) continue; // the bag's minimum
-            const auto* expected = model.get(key.text, 2, device.clock.wallNow());
-            const Value set = expected ? expected->set : Value();
-            const std::size_t before = tasks().size();
-            auto call = search(*connection, ++queryId, key.text);
-            if (expected) {
-                ASSERT_EQ(setsIn(*call), Value(Value::Array{set})) << key.text;
-                ASSERT_EQ(tasks().size(), before) << key.text;
-                ++hits;
-            } else {
-                ASSERT_TRUE(call->pending() && tasks().size() == before + 1) << key.text;
-                underWay.push_back({lastTask(), key.text, device.clock.wallNow() + 180ms});
-                ++requests;
-            }
-        }
-    }
-    EXPECT_EQ(counter("vistrel.ondevicecachehits"), hits);
-    EXPECT_GT(hits, requests) << "most requests are saved";
-    EXPECT_GT(model.flushes, 0) << "the corpus fills the cache";
-}
 
 /// One schedule of a few users: what they send, what the service does and when, and what the device does meanwhile.
 class Schedule {

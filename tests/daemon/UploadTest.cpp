@@ -392,28 +392,6 @@ TEST_F(UploadTest, WhicheverWriteFailsOnlyWhatItHeldIsLost)
     }
 }
 
-TEST_F(UploadTest, AThousandClientsComeAndGo)
-{
-    for (const bool shared : {true, false}) {
-        begin(shared);
-        const std::size_t events = shared ? 3 : 2; // the end of its connection is one, too
-        for (int i = 0; i < 1000; ++i) {
-            connection = client("client" + std::to_string(i), "Agent/" + std::to_string(i), 1000 + i);
-            report("ZRClearInputFeedback");
-            connection->end();
-        }
-        device.drain();
-        flushSession();
-        upload();
-        ASSERT_GE(uploads().size(), 1000u);
-        std::size_t whole = 0;
-        for (const auto& task : uploads()) whole += typesIn(decoded(*task)).size() == events;
-        EXPECT_EQ(whole, 1000u) << shared;
-        EXPECT_TRUE(sessionFiles().empty());
-        expectBooksClose();
-    }
-}
-
 TEST_F(UploadTest, AnUploadThatCannotBeMadeIsDropped)
 {
     begin();

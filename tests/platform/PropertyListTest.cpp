@@ -122,20 +122,5 @@ TEST(PropertyList, RefusesHostileFiles)
     EXPECT_FALSE(parsePropertyList(propertyList({"\x09"}), 20));
 }
 
-TEST(PropertyList, DamagedFilesNeverCrash)
-{
-    const std::string file = toPropertyList(Value::dictionaryOf({{"a", Value::Array{1, "text", 0.5, Bytes("data")}},
-                                                                 {"b", Dictionary{{"c", -1}}}}))
-                                 .value();
-    for (std::size_t length = 0; length < file.size(); ++length)
-        EXPECT_FALSE(parsePropertyList(file.substr(0, length)));
-    for (std::size_t bit = 0; bit < file.size() * 8; ++bit) {
-        std::string damaged = file;
-        damaged[bit / 8] = static_cast<char>(damaged[bit / 8] ^ 1 << (bit % 8));
-        const auto value = parsePropertyList(damaged);
-        EXPECT_TRUE(value || !value.error().reason().empty()) << "bit " << bit;
-    }
-}
-
 } // namespace
 } // namespace platform
