@@ -41,7 +41,8 @@ TEST(Resource, OneThatIsNotThereSaysWhyAndWhatToDo)
         TAVBagAnswer bag;
         const char* text;
     } cases[]{
-        {"TAVQIFeatures", missing, listing, "not downloaded yet. It comes from https://r.example/f?version=3"},
+        {"TAVQIFeatures", missing, listing,
+         "not downloaded yet. The daemon downloads it from https://r.example/f?version=3"},
         {"TAVVistrelModels", missing, listing, "the bag lists no TAVVistrelModels"},
         {"TAVQIFeatures", missing, {}, "defaults read TAVBagURL"},
         {"TAVQIFeatures", unreadable, listing, "can't read TAVQIFeatures: Is a directory"},

@@ -50,7 +50,7 @@ TEST(Results, SkipReasonsFollowTheBag)
     EXPECT_EQ(skipReason({}, "w"), "");
     EXPECT_EQ(skipReason(bagOf({{"minimumQueryLength", 2}}), "\U0001F326"), "") << "two UTF-16 units";
     EXPECT_THAT(skipReason(bagOf({{"minimumQueryLength", 3}}), "we"), HasSubstr("minimum of 3"));
-    EXPECT_THAT(skipReason(bagOf({{"isEnabled", false}}), "weather"), HasSubstr("switched off"));
+    EXPECT_THAT(skipReason(bagOf({{"isEnabled", false}}), "weather"), HasSubstr("disables search"));
 }
 
 TEST(Results, ListsWhatIsThereOfAnAnswerOfAnyShape)

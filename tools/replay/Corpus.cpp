@@ -11,7 +11,7 @@ namespace {
 constexpr int kLongestPause = 3'600'000;   // milliseconds
 constexpr std::size_t kLongestText = 1000; // bytes
 
-/// Cuts the part before the first `end` off the front of `text`; all of it where there is none.
+/// Removes and returns the part of `text` before the first `end`, or all of it if there is no `end`.
 std::string_view takeUpTo(char end, std::string_view& text)
 {
     const auto at = std::min(text.find(end), text.size());
@@ -26,7 +26,7 @@ void removeLastCharacter(std::string& text)
     if (!text.empty()) text.pop_back();
 }
 
-/// Whether the text is one character of UTF-8, by its lead byte.
+/// Returns true if the text is as long as its first UTF-8 byte says.
 bool isOneCharacter(std::string_view text)
 {
     const auto first = text.empty() ? 0 : static_cast<unsigned char>(text[0]);
@@ -34,14 +34,14 @@ bool isOneCharacter(std::string_view text)
     return length > 0 && text.size() == length;
 }
 
-/// Adds a key to the query; answers what is wrong with it, nothing if it is sound.
+/// Adds a key to the query. Returns what is wrong with it, or an empty string.
 std::string addKey(std::string_view token, TypedQuery& query)
 {
     int pause = 0;
     const auto [end, error] = std::from_chars(token.data(), token.data() + token.size(), pause);
     const auto digits = static_cast<std::size_t>(end - token.data());
     if (error != std::errc() || pause < 0 || pause > kLongestPause || !token.substr(digits).starts_with(':'))
-        return fmt::format("\"{}\" is no PAUSE:KEY", token);
+        return fmt::format("\"{}\" is not PAUSE:KEY", token);
     const std::string_view key = token.substr(digits + 1);
     std::string text = query.keys.empty() ? "" : query.keys.back().text;
     if (key == "⌫")
@@ -51,8 +51,8 @@ std::string addKey(std::string_view token, TypedQuery& query)
     else if (isOneCharacter(key))
         text += key;
     else
-        return fmt::format("\"{}\" is no key", key);
-    if (text.size() > kLongestText) return fmt::format("more than {} bytes are typed", kLongestText);
+        return fmt::format("\"{}\" is not a key", key);
+    if (text.size() > kLongestText) return fmt::format("the typed text is longer than {} bytes", kLongestText);
     query.keys.push_back({std::chrono::milliseconds(pause), std::move(text)});
     return {};
 }

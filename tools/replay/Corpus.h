@@ -7,13 +7,13 @@
 
 #include "platform/values/Error.h"
 
-/// What users typed, key by key, as a text file: a line for each query,
+/// A text file of what users typed, key by key, with a line for each query:
 ///
 ///     WANTED <tab> PAUSE:KEY PAUSE:KEY …
 ///
-/// where WANTED is what the user had in mind, for readers of the file; PAUSE is the time since the key before, in
-/// milliseconds; and KEY the character that was typed: "␣" for a blank, "⌫" where the last one was taken back. Every
-/// query begins with an empty line of input. Lines that begin with "#" are comments.
+/// WANTED is what the user had in mind and is for readers only. PAUSE is the time since the previous key in
+/// milliseconds. KEY is the typed character: "␣" for a blank, "⌫" for Backspace. Every query starts with empty input.
+/// Lines that begin with "#" are comments.
 namespace tavrin::replay {
 
 struct Keystroke {
@@ -26,7 +26,7 @@ struct TypedQuery {
     std::vector<Keystroke> keys;
 };
 
-/// The error names the line and what is wrong with it.
+/// The error names the line and the problem.
 [[nodiscard]] platform::Result<std::vector<TypedQuery>> parseCorpus(std::string_view text);
 
 } // namespace tavrin::replay

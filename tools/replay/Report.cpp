@@ -43,7 +43,7 @@ std::string latencyLine(std::string_view name, const std::vector<double>& values
     return line + fmt::format(" {:>9.2f}\n", percentile(values, 100) * 1e3);
 }
 
-/// The text for which a reply's HTTP request was made.
+/// Returns the text that the reply's HTTP request was made for.
 std::string fetchedFor(const TAVReply& reply)
 {
     const auto url = platform::Url::parse(reply.httpRequest->url);
@@ -103,7 +103,8 @@ void Report::addUnanswered(const Search& search)
     _failed.push_back(fmt::format("\"{}\" ({}): no answer", search.text, search.queryId));
 }
 
-/// Answers come in the order in which the daemon sent them: after a later search's, there must be none with results.
+/// Answers arrive in the order in which the daemon sent them: none with results may follow the answer to a later
+/// search.
 void Report::checkOrder(const Search& search)
 {
     if (search.queryId < _newestAnswered)
@@ -111,7 +112,7 @@ void Report::checkOrder(const Search& search)
                                      search.queryId, _newestAnswered));
 }
 
-/// What comes from memory was fetched for the beginning of what is typed, goes on as it does, and isn't too old.
+/// A cached set must have been fetched for a prefix of the typed text, must complete it, and must not be expired.
 void Report::checkCached(const Search& search, const TAVAnswer& answer, const Value& sets)
 {
     const std::string typed = platform::lowerCased(search.text);

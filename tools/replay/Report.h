@@ -30,20 +30,20 @@ struct Search {
 
 [[nodiscard]] Kind kindOf(const platform::Result<TAVAnswer>& answer);
 
-/// Keeps account of the answers to one connection's searches, which are verbose, and finds those that should never have
-/// been delivered. Times come from the caller.
+/// Counts the answers to one connection's verbose searches and finds those that must not have been delivered. The
+/// caller passes the times. Not thread-safe.
 class Report {
 public:
-    /// Answers are to be added as they come.
+    /// Adds an answer. Call in the order of arrival.
     void add(const Search& search, const platform::Result<TAVAnswer>& answer);
-    /// No answer came for this one.
+    /// Adds a search without an answer.
     void addUnanswered(const Search& search);
 
     [[nodiscard]] std::uint64_t keys() const { return _keys; }
     [[nodiscard]] std::uint64_t hits() const { return static_cast<std::uint64_t>(_cache.size()); }
-    /// Searches that went to the service; those that were overtaken on their way included.
+    /// The number of searches that went to the service, including overtaken ones.
     [[nodiscard]] std::uint64_t requests() const { return _network.size() + _overtaken + _failed.size(); }
-    /// What was wrong with each answer that was stale, or that failed.
+    /// One message for each stale answer, and for each failed one.
     [[nodiscard]] const std::vector<std::string>& stale() const { return _stale; }
     [[nodiscard]] const std::vector<std::string>& failed() const { return _failed; }
 
@@ -66,7 +66,7 @@ private:
     std::map<std::string, double> _fetched; // when the service's latest answer for a text had come, overtaken or not
 };
 
-/// The value that so many percent of all are not above; 0 for none.
+/// Returns the smallest value that is not exceeded by `percent` of the values; 0 if there are none.
 [[nodiscard]] double percentile(std::vector<double> values, double percent);
 
 } // namespace tavrin::replay

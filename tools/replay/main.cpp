@@ -1,4 +1,4 @@
-// tavrin-replay: types a corpus into a running daemon as its users did, and reports how it was answered.
+// tavrin-replay: types a corpus into a running daemon at the users' pace and reports how the daemon answered.
 
 #include <cstdio>
 #include <cstdlib>
@@ -55,7 +55,7 @@ double now()
     return static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_nsec) * 1e-9;
 }
 
-/// A client that sends a search for each key and takes the answers as they come.
+/// A client that sends a search for each key and receives the answers meanwhile.
 class Replay {
 public:
     explicit Replay(const Options& options)
@@ -65,9 +65,9 @@ public:
         TAVSessionConfiguration configuration(options.identifier, "tavrin-replay/1");
         configuration.dontPreloadImages = true; // the report is about searches
         (void)valueOf(_client->configure(configuration), "configure");
-        for (int attempt = 0; attempt < 10 && !_bag; ++attempt) // each waits a second for the first one
+        for (int attempt = 0; attempt < 10 && !_bag; ++attempt) // each waits up to a second for the first bag
             _bag = valueOf(_client->bag(), "the bag").bag;
-        if (!_bag) fail("the daemon has no bag");
+        if (!_bag) fail("the daemon has no bag; check its URL: tavrinctl defaults read TAVBagURL");
     }
 
     Report run(const std::vector<TypedQuery>& queries)
@@ -100,7 +100,7 @@ private:
         for (Search& earlier : _underWay) earlier.overtaken = true;
         auto request = TAVSearchRequest::searchRequestWithString(text, StartSearchTrigger::NewCharacter);
         request->queryId = ++_lastQueryId;
-        request->verboseReply = true; // it tells the cache's answers from the service's
+        request->verboseReply = true; // shows if the cache or the service answered
         const auto search = _underWay.insert(_underWay.end(), {.queryId = _lastQueryId, .text = text});
         search->tooShort = !_bag->isEnabled() || platform::utf16Length(text) < _bag->minimumQueryLength();
         search->sent = now();
@@ -141,21 +141,20 @@ int main(int argc, char** argv)
     Options options;
     CLI::App app(
         "Types a corpus of queries into the daemon, key by key, and reports hits, requests saved, stale answers and "
-        "latencies. Ends with 1 where an answer was stale or failed.");
-    app.add_option("corpus", options.corpus, "The corpus: tools/replay/corpus.txt, or one of its form")->required();
+        "latencies. The exit status is 1 if an answer was stale or failed.");
+    app.add_option("corpus", options.corpus, "Corpus file in the form of tools/replay/corpus.txt")->required();
     app.add_option("--address", options.address, "The daemon's D-Bus address")->capture_default_str();
-    app.add_option("--identifier", options.identifier, "Client identifier to introduce oneself with")
-        ->capture_default_str();
-    CLI::Option* speed = app.add_option("--speed", options.speed, "Type so many times as fast as the users did")
+    app.add_option("--identifier", options.identifier, "Client identifier to connect as")->capture_default_str();
+    CLI::Option* speed = app.add_option("--speed", options.speed, "Factor on the speed of the users")
                              ->check(CLI::Range(0.01, 100000.0))
                              ->capture_default_str();
-    app.add_flag("--lockstep", options.lockstep, "No pauses: each key as soon as the one before it is answered")
+    app.add_flag("--lockstep", options.lockstep, "Type each key as soon as the previous one is answered")
         ->excludes(speed);
-    app.add_option("-n,--queries", options.queries, "Only the first so many queries; 0 is all");
+    app.add_option("-n,--queries", options.queries, "Number of queries to type; 0 types all");
     app.add_option("--timeout", options.timeout, "Seconds to wait for an answer")
         ->check(CLI::Range(0.001, 86400.0))
         ->capture_default_str();
-    app.add_flag("--json", options.json, "Report in JSON");
+    app.add_flag("--json", options.json, "Print JSON");
     CLI11_PARSE(app, argc, argv);
     return run(options);
 }

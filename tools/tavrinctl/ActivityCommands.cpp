@@ -1,4 +1,4 @@
-// tavrinctl activity: what applications told of their use. Needs no daemon.
+// tavrinctl activity: the activities that applications reported. Needs no daemon.
 
 #include <cerrno>
 #include <charconv>
@@ -31,7 +31,7 @@ Date now()
     return std::chrono::time_point_cast<platform::Duration>(std::chrono::system_clock::now());
 }
 
-/// Seconds since 1970, or a date that may have a time, which may be in UTC ("Z").
+/// Parses seconds since 1970, or a date with an optional time, which is UTC if it ends with "Z".
 Date dateOf(const std::string& text)
 {
     constexpr std::int64_t kLatest = 9'000'000'000; // in 2255; a date has no room for much more
@@ -109,10 +109,10 @@ void add(const Options& options, const ActivityOptions& mine)
     if (!mine.url.empty()) activity.contentUrl = mine.url;
     const auto files = platform::makeSystemFiles();
     if (const auto added = platform::AppActivities(*files, directory()).add(activity, now()); !added)
-        throw Failure(fmt::format("the activity is not added: {}", added.error().reason()));
+        throw Failure(fmt::format("the activity was not added: {}", added.error().reason()));
     if (options.json) return printJson(describe(activity));
     printLine(line(activity));
-    if (!mine.isPublic) printLine("Activities that are not public are never recorded; --public makes one that is.");
+    if (!mine.isPublic) printLine("The daemon never records an activity that is not public; use --public.");
 }
 
 void list(const Options& options)
@@ -123,7 +123,7 @@ void list(const Options& options)
     if (!activities && activities.error().domain == platform::kPosixErrorDomain && activities.error().code == ENOENT)
         activities.emplace();
     if (!activities)
-        throw Failure(fmt::format("the activities in {} can't be read: {}; where that stays so, remove the database",
+        throw Failure(fmt::format("can't read the activities in {}: {}. If the error persists, remove the database",
                                   directory().string(), activities.error().reason()));
     if (options.limit > 0 && activities->size() > options.limit)
         activities->erase(activities->begin(), activities->end() - static_cast<std::ptrdiff_t>(options.limit));
@@ -133,7 +133,7 @@ void list(const Options& options)
         return printJson(all);
     }
     for (const AppActivity& activity : *activities) printLine(line(activity));
-    if (activities->empty()) printLine("No application has told anything yet; \"tavrinctl activity add\" does.");
+    if (activities->empty()) printLine("No activities yet. \"tavrinctl activity add\" adds one.");
 }
 
 } // namespace
@@ -141,23 +141,23 @@ void list(const Options& options)
 void addActivityCommands(CLI::App& app, Command& chosen)
 {
     auto options = std::make_shared<ActivityOptions>();
-    CLI::App* activity = app.add_subcommand("activity", "What applications told of their use; needs no daemon");
+    CLI::App* activity = app.add_subcommand("activity", "Activities that applications reported; needs no daemon");
     activity->require_subcommand(1);
 
-    CLI::App* adding = activity->add_subcommand("add", "Tell of a use, as an application does");
+    CLI::App* adding = activity->add_subcommand("add", "Report an activity as an application does");
     adding->add_option("--app", options->app, "The application's identifier, org.example.News")->required();
-    adding->add_option("--url", options->url, "Where the content is");
+    adding->add_option("--url", options->url, "URL of the content");
+    adding->add_option("--identifier", options->identifier, "Unique identifier of the content within the application");
+    adding->add_flag(
+        "--public,!--not-public", options->isPublic,
+        "Whether everyone may see the content; the daemon records only public activities. Default: not public");
     adding->add_option(
-        "--identifier", options->identifier,
-        "The content's unique identifier in the application (not the client's, which is of no use here)");
-    adding->add_flag("--public,!--not-public", options->isPublic,
-                     "Whether the content is open to everyone; only then it is recorded. It isn't by default");
-    adding->add_option("--at", options->at,
-                       "When: 2026-01-31T12:00 (with \"Z\": in UTC) or seconds since 1970; now by default");
-    adding->footer("The daemon records the activities of a day twice a day, while nobody uses the device.");
+        "--at", options->at,
+        "Start of the activity: 2026-01-31T12:00 (UTC with a final \"Z\") or seconds since 1970; default: now");
+    adding->footer("The daemon records activities twice a day, while the device is not in use.");
     adding->callback([&chosen, options] { chosen = [options](const Options& common) { add(common, *options); }; });
 
-    activity->add_subcommand("list", "The activities of the last days, the latest last; --limit as many")
+    activity->add_subcommand("list", "List the activities of the last days, the latest last; at most --limit")
         ->callback([&chosen] { chosen = list; });
 }
 

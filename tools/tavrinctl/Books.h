@@ -7,8 +7,8 @@
 
 namespace tavrin::ctl {
 
-/// The books of the feedback pipeline, in events, as lines for people: what was recorded is the sum of what became of
-/// it, what was dropped and why, and whether that closes. `books` is the "feedback" of the daemon's status.
+/// Formats the event counts of the feedback pipeline: recorded events and where they are, drops by reason, and whether
+/// the sum is right. `books` is "feedback" in the daemon's status.
 [[nodiscard]] std::vector<std::string> bookLines(const platform::Value& books);
 
 } // namespace tavrin::ctl

@@ -6,20 +6,20 @@
 
 namespace tavrin::ctl {
 
-/// What a user sees as one character: a letter with its accents, an emoji with its modifiers.
+/// A grapheme cluster: a letter with its accents, an emoji with its modifiers.
 struct Character {
-    std::string_view bytes; ///< of the text that it was found in
-    int columns = 0;        ///< that a terminal gives it: 0, 1 or 2
+    std::string_view bytes; ///< a part of the text it was found in
+    int columns = 0;        ///< width on a terminal: 0, 1 or 2
 };
 
-/// The characters of a UTF-8 text, in order. A byte that is no part of valid UTF-8 counts as one.
+/// Splits a UTF-8 text into grapheme clusters. Each invalid byte is a cluster of its own.
 [[nodiscard]] std::vector<Character> charactersOf(std::string_view text);
 
 [[nodiscard]] int columnsOf(std::string_view text);
 
-/// As much of the text as fits; what was cut is an ellipsis.
+/// Cuts a text to a width and marks the cut with an ellipsis.
 [[nodiscard]] std::string clipped(std::string_view text, int columns);
-/// The same, filled up with blanks.
+/// The same, padded with blanks to the width.
 [[nodiscard]] std::string padded(std::string_view text, int columns);
 
 } // namespace tavrin::ctl

@@ -10,10 +10,10 @@ namespace CLI {
 class App;
 }
 
-/// The commands: each adds itself to the command line, and sets `chosen` when it is the one that was given.
+/// The commands. Each function adds its subcommands to `app`; parsing the command line sets `chosen` to the one given.
 namespace tavrin::ctl {
 
-/// What the command does, once the command line has been read.
+/// Runs a command after the command line was parsed. Throws `Failure`.
 using Command = std::function<void(const Options&)>;
 
 void addSearchCommand(CLI::App& app, Command& chosen);

@@ -1,4 +1,4 @@
-// tavrinctl defaults: the daemon's settings, in the file that it watches. Needs no daemon.
+// tavrinctl defaults: the daemon's settings file, which the daemon watches. Needs no daemon.
 
 #include <algorithm>
 #include <array>
@@ -45,30 +45,29 @@ std::filesystem::path settingsFile(const std::string& suite)
     return platform::Directories::fromEnvironment().config / (suite + ".json");
 }
 
-/// The file's contents; none for a file that isn't there, a `Failure` for one that can't be used.
+/// Reads the settings; empty if the file is missing. Throws `Failure` if the file is unreadable or not a JSON object.
 Dictionary readSettings(const std::filesystem::path& path)
 {
     auto bytes = platform::makeSystemFiles()->read(path, kMaximumFileSize);
     if (!bytes && bytes.error().code == ENOENT) return {};
-    if (!bytes) throw Failure(fmt::format("{} can't be read: {}", path.string(), bytes.error().reason()));
+    if (!bytes) throw Failure(fmt::format("can't read {}: {}", path.string(), bytes.error().reason()));
     auto value = platform::parseJson(bytes->view());
     if (!value || !value->asDictionary())
         throw Failure(
-            fmt::format("{} is not a JSON object ({}).\nMend it or remove it; until then the daemon takes it for "
-                        "empty.",
+            fmt::format("{} is not a JSON object ({}).\nRepair or remove it; until then the daemon reads it as empty.",
                         path.string(), value ? "another value" : value.error().reason()));
     return *value->asDictionary();
 }
 
-/// Sets one key as the daemon does it: under the file's lock, over what others have written meanwhile. Null removes it.
+/// Sets one key under the file's lock and keeps what other processes wrote meanwhile. Null removes the key.
 Dictionary change(const std::filesystem::path& path, const std::string& key, const Value& value)
 {
-    platform::Log::threshold = platform::LogLevel::Fault; // failures are told below
+    platform::Log::threshold = platform::LogLevel::Fault; // failures are reported below
     const auto files = platform::makeSystemFiles();
     platform::UserDefaults settings(*files, path, nullptr);
     settings.set(key, value);
     if (const auto written = settings.synchronize(); !written)
-        throw Failure(fmt::format("{} can't be written: {}", path.string(), written.error().reason()));
+        throw Failure(fmt::format("can't write {}: {}", path.string(), written.error().reason()));
     return settings.contents();
 }
 
@@ -79,7 +78,7 @@ bool fits(const Value& value, std::string_view type)
     return value.asString() != nullptr;
 }
 
-/// What the user typed: JSON where it is JSON, else a text. A key that takes a text gets one in any case.
+/// Parses the typed value as JSON, or takes it as a string if it is not JSON or if the key is known to be a string.
 Value settingValue(const std::string& key, const std::string& typed)
 {
     const auto known = std::ranges::find(kKnownKeys, key, &KnownKey::key);
@@ -95,7 +94,7 @@ void read(const Options& options, const std::string& suite, const std::string& k
     const Dictionary settings = readSettings(settingsFile(suite));
     if (key.empty()) {
         if (options.json) return printJson(settings);
-        if (settings.empty()) printLine("Nothing is set; \"tavrinctl defaults list\" tells what can be.");
+        if (settings.empty()) printLine("Nothing is set. \"tavrinctl defaults list\" lists the settings.");
         for (const auto& [name, value] : settings)
             printLine(fmt::format("{} = {}", printable(name), platform::toJson(value)));
         return;
@@ -133,39 +132,40 @@ void addDefaultsCommands(CLI::App& app, Command& chosen)
     defaults->require_subcommand(1);
     const auto add = [&](const char* name, const char* description, auto action) {
         CLI::App* command = defaults->add_subcommand(name, description);
-        command->add_option("--suite", options->suite, "The settings of another program")->capture_default_str();
+        command->add_option("--suite", options->suite, "Program whose settings are meant")->capture_default_str();
         command->callback([&chosen, action, options] {
             chosen = [action, options](const Options& common) { action(common, *options); };
         });
         return command;
     };
 
-    add("read", "One setting, or all that are set", [](const Options& common, const DefaultsOptions& mine) {
+    add("read", "Print one setting, or all that are set", [](const Options& common, const DefaultsOptions& mine) {
         read(common, mine.suite, mine.key);
-    })->add_option("key", options->key, "Which one");
+    })->add_option("key", options->key, "Name of the setting");
 
-    CLI::App* write =
-        add("write", "Set one; the daemon sees it at once", [](const Options& common, const DefaultsOptions& mine) {
-            const auto path = settingsFile(mine.suite);
-            (void)readSettings(path); // a broken file is for its owner to mend
-            const Value value = settingValue(mine.key, mine.value);
-            change(path, mine.key, value);
-            if (common.json) printJson(Value::dictionaryOf({{mine.key, value}}));
-        });
-    write->add_option("key", options->key, "Which one")->required();
-    write->add_option("value", options->value, "JSON, or a text")->required();
+    CLI::App* write = add("write", "Change a setting; the daemon applies it at once",
+                          [](const Options& common, const DefaultsOptions& mine) {
+                              const auto path = settingsFile(mine.suite);
+                              (void)readSettings(path); // never overwrites a broken file
+                              const Value value = settingValue(mine.key, mine.value);
+                              change(path, mine.key, value);
+                              if (common.json) printJson(Value::dictionaryOf({{mine.key, value}}));
+                          });
+    write->add_option("key", options->key, "Name of the setting")->required();
+    write->add_option("value", options->value, "JSON, or plain text")->required();
 
-    add("delete", "Unset one",
+    add("delete", "Remove a setting",
         [](const Options& common, const DefaultsOptions& mine) {
             const auto path = settingsFile(mine.suite);
             if (!readSettings(path).contains(mine.key)) throw Failure(fmt::format("{} is not set", mine.key));
             const Dictionary settings = change(path, mine.key, Value());
             if (common.json) printJson(settings);
         })
-        ->add_option("key", options->key, "Which one")
+        ->add_option("key", options->key, "Name of the setting")
         ->required();
 
-    add("list", "What can be set", [](const Options& common, const DefaultsOptions&) { list(common); });
+    add("list", "List the settings and their effects",
+        [](const Options& common, const DefaultsOptions&) { list(common); });
 }
 
 } // namespace tavrin::ctl

@@ -23,7 +23,7 @@ namespace {
 constexpr std::size_t kLongestText = 60; // bytes
 constexpr std::size_t kMostTypes = 24;   // runs of one type
 
-/// The text, cut to so many bytes between two characters.
+/// Cuts the text to at most this many bytes, between two characters.
 std::string shortened(const std::string& text)
 {
     const std::string_view start = platform::cut(text, kLongestText);
@@ -36,7 +36,7 @@ std::string textOr(const Value& value, std::string_view fallback)
     return text && !text->empty() ? shortened(*text) : std::string(fallback);
 }
 
-/// "name=value", "name" for true, "name[3]" for what has parts; nothing for what says nothing.
+/// Returns "name=value", "name" for true, "name[3]" for an array; empty for null, false and empty values.
 std::string fieldText(const std::string& name, const Value& value)
 {
     switch (value.type()) {
@@ -54,7 +54,7 @@ std::string fieldText(const std::string& name, const Value& value)
     }
 }
 
-/// "search_start, search_end ×3, error"; the first ones of many.
+/// Returns the first event types: "search_start, search_end ×3, error".
 std::string typesInOrder(const Value::Array& events)
 {
     std::vector<std::pair<std::string, std::size_t>> runs;

@@ -8,18 +8,18 @@
 #include "platform/values/Dictionary.h"
 #include "platform/values/Value.h"
 
-/// Feedback as people read it: short lines, safe for a terminal.
+/// Formats feedback as short lines that are safe for a terminal.
 namespace tavrin::ctl {
 
-/// The fields of an event or a record but for `left out`: "trigger_event=tap input="weather" results[3]". What is null,
-/// false or empty is left out, long texts are shortened.
+/// Formats the fields of an event or a record: "trigger_event=tap input="weather" results[3]". Omits the fields in
+/// `leftOut` and those that are null, false or empty; cuts long texts.
 [[nodiscard]] std::string fieldsLine(const platform::Dictionary& fields,
                                      std::initializer_list<std::string_view> leftOut);
 
-/// "query 7", or nothing for an event of no query.
+/// Returns "query 7", or an empty string for an event without a query.
 [[nodiscard]] std::string queryText(const platform::Value& queryId);
 
-/// An event object: its type, its query, then its other fields but for the time.
+/// Formats an event: its type, its query, then its other fields except the time.
 [[nodiscard]] std::string eventLine(const platform::Value& event);
 
 /// The body of an upload.
@@ -31,10 +31,10 @@ struct FlushedBody {
 };
 [[nodiscard]] FlushedBody flushedBody(const platform::Bytes& packed);
 
-/// A session's agent, user, number of events and sizes, and on the next line its first event types in their order; or
-/// the keys of a record that is sent on its own.
+/// Formats a session's agent, user, number of events and sizes, and on a second line its first event types; or the keys
+/// of a record that was sent on its own.
 [[nodiscard]] std::string summary(const FlushedBody& body);
-/// {"packed_size", "size", "body"}, or {"packed_size", "error"}.
+/// Returns {"packed_size", "size", "body"}, or {"packed_size", "error"} for a broken body.
 [[nodiscard]] platform::Value describe(const FlushedBody& body);
 
 } // namespace tavrin::ctl

@@ -1,4 +1,4 @@
-// tavrinctl feedback: report events as a client does, and what the current session holds.
+// tavrinctl feedback: reports events as a client does, and shows the events of the current session.
 
 #include <algorithm>
 #include <array>
@@ -23,11 +23,11 @@ namespace {
 
 constexpr std::size_t kMaximumFile = 64u << 20;
 constexpr std::size_t kProblemsShown = 20;
-constexpr std::size_t kOutstanding = 64; // reports that are out before the next one is sent
+constexpr std::size_t kOutstanding = 64; // reports without an answer before the next one is sent
 
 constexpr const char* kExamples =
     R"(FILE is JSON: one record or an array of them; "-" is standard input. A record has its "class", the fields of the
-class, and the "queryId" that it belongs to. Enumerations are numbers. Nothing is sent unless all is right.
+class, and the "queryId" that it belongs to. Enumerations are numbers. Nothing is sent if any record is wrong.
 "tavrinctl feedback records" lists the classes and their fields.
 
   echo '{"class": "ZRSearchViewAppearFeedback", "viewAppearEvent": 5}' | tavrinctl feedback send -
@@ -47,7 +47,8 @@ std::string contents(const std::string& file)
         std::array<char, 1u << 16> piece;
         while (text.size() <= kMaximumFile && std::cin.read(piece.data(), piece.size()).gcount() > 0)
             text.append(piece.data(), static_cast<std::size_t>(std::cin.gcount()));
-        if (text.size() > kMaximumFile) throw Failure(fmt::format("more than {} bytes", kMaximumFile));
+        if (text.size() > kMaximumFile)
+            throw Failure(fmt::format("standard input has more than {} bytes", kMaximumFile));
         return text;
     }
     return readFile(file, kMaximumFile);
@@ -56,7 +57,7 @@ std::string contents(const std::string& file)
 std::vector<ReportedEvent> eventsInFile(const std::string& file)
 {
     const auto json = platform::parseJson(contents(file), kMaximumFile);
-    if (!json) throw Failure(fmt::format("{}: not JSON: {}", file, json.error().reason()));
+    if (!json) throw Failure(fmt::format("{} is not JSON: {}", file, json.error().reason()));
     auto events = eventsIn(*json);
     if (events) return std::move(*events);
     const std::vector<std::string>& problems = events.error();
@@ -73,17 +74,17 @@ void send(const Options& options, const std::string& file)
     const std::vector<ReportedEvent> events = eventsInFile(file);
     const Session session = openSession(options);
     if (const auto bag = session.client->bag(); bag && bag->bag && !bag->bag->feedbackEnabled())
-        fmt::print(stderr, "tavrinctl: the bag has feedback switched off for {}: the daemon drops them\n",
-                   options.agent);
+        fmt::print(stderr, "tavrinctl: the bag disables feedback for {}: the daemon drops the events\n", options.agent);
 
     std::size_t out = 0, taken = 0;
     std::string refusal;
     const auto wait = [&](std::size_t most) {
         const auto timeout = platform::durationFromSeconds(options.timeout);
         if (session.client->wait([&] { return out <= most; }, timeout)) return;
-        throw Failure(fmt::format("{} of {} events were taken, then {}", taken, events.size(),
-                                  session.client->connected() ? fmt::format("nothing within {:g} s", options.timeout)
-                                                              : "the daemon closed the connection"));
+        throw Failure(fmt::format("the daemon accepted {} of {} events, then {}", taken, events.size(),
+                                  session.client->connected()
+                                      ? fmt::format("sent no answer within {:g} s; see --timeout", options.timeout)
+                                      : "closed the connection"));
     };
     for (const ReportedEvent& event : events) {
         ++out;
@@ -102,7 +103,8 @@ void send(const Options& options, const std::string& file)
         printJson(Value::dictionaryOf({{"reported", taken}, {"refused", events.size() - taken}}));
     else
         printLine(fmt::format("{} event{} reported.", taken, taken == 1 ? "" : "s"));
-    if (!refusal.empty()) throw Failure(fmt::format("{} refused: {}", events.size() - taken, refusal));
+    if (!refusal.empty())
+        throw Failure(fmt::format("the daemon refused {} events: {}", events.size() - taken, refusal));
 }
 
 void list(const Options& options)
@@ -110,8 +112,8 @@ void list(const Options& options)
     const Value::Array events = valueOf(openSession(options).client->feedback());
     if (options.json) return printJson(events);
     if (events.empty())
-        return printLine("The daemon keeps no feedback of a current session in memory; "
-                         "\"tavrinctl watch\" shows events as they come.");
+        return printLine("The daemon holds no events of a current session in memory. "
+                         "\"tavrinctl watch\" shows events as they arrive.");
     for (const Value& event : events)
         printLine(fmt::format("{:>9.3f} s  {}", event["timestamp"].asDouble().value_or(0) / 1000, eventLine(event)));
 }
@@ -131,19 +133,19 @@ void listRecords(const Options& options)
 
 void addFeedbackCommands(CLI::App& app, Command& chosen)
 {
-    CLI::App* feedback = app.add_subcommand("feedback", "The current session's feedback, or more of it");
+    CLI::App* feedback = app.add_subcommand("feedback", "Show the current session's events, or report more");
     feedback->require_subcommand(0, 1);
-    // Called after those of its own subcommands.
+    // Runs after the callbacks of its subcommands.
     feedback->callback([&chosen, feedback] {
         if (feedback->get_subcommands().empty()) chosen = list;
     });
 
     CLI::App* sendCommand = feedback->add_subcommand("send", "Report events as a client does");
     auto file = std::make_shared<std::string>();
-    sendCommand->add_option("file", *file, "JSON, see below")->required();
+    sendCommand->add_option("file", *file, "JSON file, or - for standard input; see below")->required();
     sendCommand->footer(kExamples);
     sendCommand->callback([&chosen, file] { chosen = [file](const Options& options) { send(options, *file); }; });
-    feedback->add_subcommand("records", "What can be reported: the classes of records and their fields")
+    feedback->add_subcommand("records", "List the classes of records that can be reported, with their fields")
         ->callback([&chosen] { chosen = listRecords; });
 }
 

@@ -19,8 +19,8 @@ namespace {
 
 constexpr std::string_view kQueryId = "queryId";
 
-/// Walks a record beside the JSON that it was read from, and looks for keys there that are no fields: reading skips
-/// them, and they are likely to be misspelt.
+/// Compares a record with the JSON that it was read from and finds unknown keys, which the decoder skips: they are
+/// probably misspelt.
 class StrayKeys final : public platform::Encoder {
 public:
     StrayKeys(const Value& json, std::vector<std::string>& strays) : _json(json), _strays(strays) {}
@@ -55,7 +55,7 @@ public:
     void value(const Value&) override { next(); }
 
 private:
-    /// A record or an array that is being walked.
+    /// The record or array of one level.
     struct Open {
         Value json;
         std::string place;
@@ -64,14 +64,14 @@ private:
         std::size_t index; ///< of an array: one behind the element at hand
     };
 
-    /// The JSON of the value at hand.
+    /// The JSON of the current value.
     Value next()
     {
         if (_open.empty()) return _json;
         Open& open = _open.back();
         return open.json.asArray() ? open.json[open.index++] : open.json[open.key];
     }
-    /// Where it is; after `next`.
+    /// The path of the current value; valid after `next`.
     [[nodiscard]] std::string place() const
     {
         if (_open.empty()) return {};
@@ -85,7 +85,7 @@ private:
     std::vector<Open> _open;
 };
 
-/// Notes the names of a record's fields.
+/// Collects the names of a record's fields.
 class FieldNames final : public platform::Encoder {
 public:
     Value::Array names;
@@ -106,7 +106,7 @@ public:
     void value(const Value&) override {}
 };
 
-/// Reads one record, or says what is wrong with it.
+/// Reads one record, or adds what is wrong with it to the problems.
 std::expected<ReportedEvent, std::vector<std::string>> eventIn(const Value& json)
 {
     const auto wrong = [](std::string problem) { return std::unexpected(std::vector{std::move(problem)}); };

@@ -10,7 +10,7 @@
 #include "platform/values/Value.h"
 #include "searchrecords/ZRFeedback.h"
 
-/// Feedback records that somebody wrote as JSON.
+/// Parses feedback records that a user wrote as JSON.
 namespace tavrin::ctl {
 
 struct ReportedEvent {
@@ -18,11 +18,12 @@ struct ReportedEvent {
     std::shared_ptr<ZRFeedback> feedback;
 };
 
-/// One record, {"class": "ZR…Feedback", fields…}, or an array of them. "queryId" beside the fields is the event's; a
-/// record that has a field of that name gets it, too. Otherwise all that is wrong: each line says where.
+/// Parses one record, {"class": "ZR…Feedback", fields…}, or an array of them. "queryId" is the event's query id, and
+/// also sets the record's field of that name if there is one. The error lists every problem with its place, a line
+/// each.
 [[nodiscard]] std::expected<std::vector<ReportedEvent>, std::vector<std::string>> eventsIn(const platform::Value& json);
 
-/// What a client may report: {class: [fields]}, by class.
+/// Returns the records that a client may report as {class: [fields]}.
 [[nodiscard]] platform::Dictionary reportableRecords();
 
 } // namespace tavrin::ctl

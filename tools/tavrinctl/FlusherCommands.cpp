@@ -1,4 +1,4 @@
-// tavrinctl watch, flush: the feedback pipeline, live.
+// tavrinctl watch, flush: follow and control the feedback pipeline.
 
 #include <array>
 #include <chrono>
@@ -23,7 +23,7 @@ using platform::Value;
 
 namespace {
 
-/// What the bridge sends, to whoever wants it.
+/// Forwards what the bridge sends to the callbacks that are set.
 struct Listener final : TAVFlusherListener {
     std::function<void(const platform::Bytes&)> onFlushedData = [](const platform::Bytes&) {};
     std::function<void(const std::string&)> onEvent = [](const std::string&) {};
@@ -34,7 +34,7 @@ struct Listener final : TAVFlusherListener {
     void workDone() override { done = true; }
 };
 
-/// A tool at the bridge. The session beside it is what the daemon knows the tool by.
+/// A connection to the diagnostic bridge, and the client session that it was requested through.
 struct Bridge {
     Session session;
     std::unique_ptr<TAVFlusherClient> client;
@@ -51,29 +51,29 @@ struct Bridge {
     }
 };
 
-/// From here on SIGINT and SIGTERM end the program with status 0: watching has no other end.
+/// Makes SIGINT and SIGTERM end the program with status 0, because watching has no other end.
 void endOnSignal()
 {
-    static std::array<char, 1u << 20> buffer; // a line is one write, which a signal doesn't divide
+    static std::array<char, 1u << 20> buffer; // one write per line, which no signal interrupts
     std::setvbuf(stdout, buffer.data(), _IOFBF, buffer.size());
     struct sigaction action{};
     action.sa_handler = [](int) { _exit(EXIT_SUCCESS); };
     for (const int signal : {SIGINT, SIGTERM}) sigaction(signal, &action, nullptr);
 }
 
-/// Shows what the bridge sends, until there was enough of it.
+/// Shows what the bridge sends until `count` items were shown.
 class Watch {
 public:
-    /// `count` 0 is without end. `what` tells people what they are going to see.
+    /// 0 for `count` means no limit. `what` tells the user what follows.
     Watch(const Options& options, std::uint64_t count, std::string_view what)
         : _options(options), _count(count), _what(what)
     {}
 
-    /// Whether one more is to be shown.
+    /// Counts one more item. Returns false if the limit is reached.
     bool takes()
     {
         if (full()) return false;
-        tellAttached(); // what comes ahead of the bridge's answer comes after the first line, too
+        tellAttached(); // an event may arrive before the bridge's answer
         ++_seen;
         return true;
     }
@@ -88,14 +88,14 @@ public:
 
 private:
     [[nodiscard]] bool full() const { return _count > 0 && _seen == _count; }
-    /// Scripts wait for this line before they do what they want to see.
+    /// Scripts wait for this line before they cause events.
     void tellAttached()
     {
         if (std::exchange(_told, true)) return;
         if (_options.json)
             fmt::print(stderr, "{}\n", R"({"attached":true})");
         else
-            fmt::print(stderr, "Attached: {}. Ctrl-C ends.\n", _what);
+            fmt::print(stderr, "Attached: {}. Press Ctrl-C to end.\n", _what);
     }
 
     const Options& _options;
@@ -115,7 +115,7 @@ std::string timeOfDay()
 
 void watchEvents(const Options& options, std::uint64_t count)
 {
-    Watch watch(options, count, "here is every event from now on");
+    Watch watch(options, count, "showing every event from now on");
     Listener listener;
     listener.onEvent = [&](const std::string& description) {
         if (!watch.takes()) return;
@@ -134,7 +134,7 @@ void showBody(const Options& options, const FlushedBody& body)
 
 void watchFlushes(const Options& options, std::uint64_t count)
 {
-    Watch watch(options, count, "here is every body that is flushed from now on");
+    Watch watch(options, count, "showing every body that is flushed from now on");
     Listener listener;
     listener.onFlushedData = [&](const platform::Bytes& packed) {
         if (watch.takes()) showBody(options, flushedBody(packed));
@@ -143,13 +143,13 @@ void watchFlushes(const Options& options, std::uint64_t count)
     watch.run(bridge, FlusherIntent::WatchFlushes);
 }
 
-/// Sends a command to the bridge, and waits until its work is done.
+/// Sends a command to the bridge and waits until it is done. Throws `Failure` on a time-out.
 void work(const Options& options, Bridge& bridge, const Listener& listener, FlusherIntent intent)
 {
     bridge.initiate(intent);
     if (bridge.client->wait([&] { return listener.done; }, platform::durationFromSeconds(options.timeout))) return;
     if (!bridge.client->connected()) throw Failure("the daemon closed the connection");
-    throw Failure(fmt::format("the work was not done within {:g} s; --timeout gives it longer", options.timeout));
+    throw Failure(fmt::format("the daemon did not finish within {:g} s; wait longer with --timeout", options.timeout));
 }
 
 void stopFlushing(const Options& options)
@@ -160,15 +160,15 @@ void stopFlushing(const Options& options)
     if (options.json)
         printJson(Value::dictionaryOf({{"stopped", true}}));
     else
-        printLine("Nothing is flushed in the background until \"tavrinctl flush dump\".");
+        printLine("Background flushes are stopped until \"tavrinctl flush dump\".");
 }
 
-/// Saves a body as DIR/flushed-N.json, under the first number that is free.
+/// Saves a body as DIR/flushed-N.json with the first free number. Throws `Failure`.
 std::filesystem::path save(const std::filesystem::path& directory, const FlushedBody& body)
 {
     const auto files = platform::makeSystemFiles();
     const auto failed = [&](const platform::Error& error) {
-        return Failure(fmt::format("{} can't be written: {}", directory.string(), error.reason()));
+        return Failure(fmt::format("can't write to {}: {}", directory.string(), error.reason()));
     };
     if (const auto made = files->createDirectories(directory); !made) throw failed(made.error());
     for (std::uint64_t number = 1;; ++number) {
@@ -194,14 +194,14 @@ void dump(const Options& options, const std::string& directory)
         try {
             const auto path = save(std::filesystem::absolute(directory).lexically_normal(), body);
             if (!options.json) printLine(dim("  saved as " + path.string()));
-        } catch (const Failure& failure) { // the others are shown all the same
+        } catch (const Failure& failure) { // the other bodies are still shown
             unsaved = failure.what();
         }
     };
     Bridge bridge(options, listener);
     work(options, bridge, listener, FlusherIntent::Dump);
     if (bodies == 0 && !options.json)
-        printLine("Flushed; no body came here: there was none, or another tool watches the flushes.");
+        printLine("Flushed, but received no body: either there was none, or another tool is watching flushes.");
     if (!unsaved.empty()) throw Failure(unsaved);
 }
 
@@ -211,30 +211,29 @@ void addFlusherCommands(CLI::App& app, Command& chosen)
 {
     const auto countOf = [](CLI::App* command) {
         auto count = std::make_shared<std::uint64_t>(0);
-        command->add_option("--count", *count, "End after so many; 0 is never")->capture_default_str();
+        command->add_option("--count", *count, "End after this many; 0 never ends")->capture_default_str();
         return count;
     };
 
-    CLI::App* watch = app.add_subcommand("watch", "Every event that clients report, live");
-    watch->footer(
-        "Says on standard error when it is attached. With --json each line is the event as the daemon tells it.\n"
-        "Ends with Ctrl-C, or after --count events.");
+    CLI::App* watch = app.add_subcommand("watch", "Show every event as clients report it");
+    watch->footer("Prints a line on standard error once it is attached. With --json each line is one event as JSON.\n"
+                  "Ends with Ctrl-C, or after --count events.");
     watch->callback([&chosen, count = countOf(watch)] {
         chosen = [count](const Options& options) { watchEvents(options, *count); };
     });
 
-    CLI::App* flush = app.add_subcommand("flush", "Uploads of feedback: watch, stop or force them");
+    CLI::App* flush = app.add_subcommand("flush", "Watch, stop or force uploads of feedback");
     flush->require_subcommand(1);
-    CLI::App* flushWatch = flush->add_subcommand("watch", "Every body that is flushed, live");
+    CLI::App* flushWatch = flush->add_subcommand("watch", "Show every body as it is flushed");
     flushWatch->callback([&chosen, count = countOf(flushWatch)] {
         chosen = [count](const Options& options) { watchFlushes(options, *count); };
     });
-    flush->add_subcommand("stop", "Flush nothing in the background until the next dump")->callback([&chosen] {
+    flush->add_subcommand("stop", "Stop background flushes until the next dump")->callback([&chosen] {
         chosen = stopFlushing;
     });
-    CLI::App* flushDump = flush->add_subcommand("dump", "End all sessions, flush them now and show what is sent");
+    CLI::App* flushDump = flush->add_subcommand("dump", "End all sessions, flush them now and show the bodies");
     auto directory = std::make_shared<std::string>();
-    flushDump->add_option("-o,--output", *directory, "Directory in which to save the bodies as flushed-N.json");
+    flushDump->add_option("-o,--output", *directory, "Directory to save the bodies to, as flushed-N.json");
     flushDump->callback(
         [&chosen, directory] { chosen = [directory](const Options& options) { dump(options, *directory); }; });
 }

@@ -75,7 +75,7 @@ std::filesystem::path saveImage(platform::FileSystem& files, const std::filesyst
             const auto there = files.read(path, image.size());
             if (!there || *there != image) continue;
         } else if (!file) {
-            throw Failure(fmt::format("can't write {}: give another directory with -o", file.error().reason()));
+            throw Failure(fmt::format("can't write {}: choose another directory with -o", file.error().reason()));
         } else if (const auto written = (*file)->append({image.view()}); !written) {
             (void)files.remove(path);
             throw Failure(fmt::format("can't write {}: {}", path.string(), written.error().reason()));
@@ -83,8 +83,8 @@ std::filesystem::path saveImage(platform::FileSystem& files, const std::filesyst
         taken.insert(path);
         return path;
     }
-    throw Failure(
-        fmt::format("{} has {} files of the name {}: give another with -o", directory.string(), kMostOfOneName, name));
+    throw Failure(fmt::format("{} already has {} files named {}: choose another directory with -o", directory.string(),
+                              kMostOfOneName, name));
 }
 
 } // namespace tavrin::ctl

@@ -13,19 +13,17 @@ class FileSystem;
 
 namespace tavrin::ctl {
 
-/// What bytes are by their first few: "png", "jpeg", "gif", "webp", "svg"; "html" for a page in an image's place; empty
-/// where none of these.
+/// Detects the type from the first bytes: "png", "jpeg", "gif", "webp", "svg", or "html" for a page instead of an
+/// image. Returns an empty string for anything else.
 [[nodiscard]] std::string_view imageType(std::string_view bytes);
 
-/// A name for a file of an image of that type, made of its URL (the last part of its path) or its identifier. Whatever
-/// those are, it is a plain name for this directory: letters, digits, ".", "-" and "_" of ASCII, none of them a leading
-/// ".", 80 at most, then the type's ending.
+/// Makes a file name from an image's URL (the last part of its path) or identifier, and its type. Safe for any input:
+/// at most 80 ASCII letters, digits, ".", "-" and "_" without a leading ".", followed by the type's suffix.
 [[nodiscard]] std::string imageFileName(std::string_view urlOrIdentifier, std::string_view type);
 
-/// Saves an image as a new file of that name in a directory that is there, mode 0600, and answers the file. Files that
-/// are there are left as they are: one that holds these bytes already is answered as if it were new, for others the
-/// name gets a number. A name of `taken`, to which the answer is added, is left alone as well. A `Failure` where it
-/// can't be written.
+/// Saves an image in an existing directory as a new file with mode 0600, and returns its path. Never overwrites: an
+/// existing file with the same bytes is returned, and any other one, or a path in `taken`, makes the name get a number.
+/// Adds the returned path to `taken`. Throws `Failure` if writing fails.
 [[nodiscard]] std::filesystem::path saveImage(platform::FileSystem& files, const std::filesystem::path& directory,
                                               const std::string& name, const platform::Bytes& image,
                                               std::set<std::filesystem::path>& taken);

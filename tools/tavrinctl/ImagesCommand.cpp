@@ -1,4 +1,4 @@
-// tavrinctl images: what an answer's images are, as files.
+// tavrinctl images: saves the images of an answer as files.
 
 #include <chrono>
 #include <set>
@@ -30,7 +30,7 @@ struct ImagesOptions {
     double within = 10; ///< seconds
 };
 
-/// The images of the answer to the query, and those that were given; each once, in that order.
+/// Returns the images of the answer to the query, then those given by URL and identifier, without duplicates.
 Value::Array wanted(const Options& options, const ImagesOptions& imagesOptions)
 {
     Value::Array images;
@@ -39,14 +39,15 @@ Value::Array wanted(const Options& options, const ImagesOptions& imagesOptions)
         const Exchange exchange = runner.run(
             *TAVSearchRequest::searchRequestWithString(imagesOptions.query, StartSearchTrigger::NewCharacter),
             imagesOptions.query);
-        if (exchange.outcome() != Outcome::Answered) throw Failure("the search before it: " + summary(exchange));
+        if (exchange.outcome() != Outcome::Answered)
+            throw Failure("the search for the images failed: " + summary(exchange));
         images = collectResponseImageIdentifiers(rawResponse(exchange));
         if (images.empty())
-            throw Failure(fmt::format("the answer to \"{}\" names no images: try another query, or give --url or --id",
+            throw Failure(fmt::format("the answer to \"{}\" has no images: try another query, or use --url or --id",
                                       imagesOptions.query));
     }
     for (const std::string& url : imagesOptions.urls) {
-        if (!platform::Url::parse(url)) throw Failure(fmt::format("\"{}\" is no valid URL", url), 2);
+        if (!platform::Url::parse(url)) throw Failure(fmt::format("\"{}\" is not a valid URL", url), 2);
         images.push_back(Dictionary{{"url", url}});
     }
     for (const std::string& identifier : imagesOptions.identifiers) images.push_back(Dictionary{{"id", identifier}});
@@ -64,20 +65,20 @@ std::string textOf(const Value& value)
     return text ? *text : "";
 }
 
-/// The image's URL, or its identifier.
+/// Returns the image's URL, or its identifier if it has no URL.
 std::string nameOf(const Value& image)
 {
     return image["url"].isNull() ? textOf(image["id"]) : textOf(image["url"]);
 }
 
-/// Makes the directory where it isn't there; a `Failure` where it can't.
+/// Creates the directory if it is missing. Throws `Failure` if that fails.
 std::filesystem::path directoryAt(platform::FileSystem& files, const std::string& path)
 {
     std::error_code ignored;
-    const auto found = std::filesystem::canonical(path, ignored); // links to directories are fine
+    const auto found = std::filesystem::canonical(path, ignored); // follows links
     auto directory = found.empty() ? std::filesystem::absolute(path).lexically_normal() : found;
     if (const auto made = files.createDirectories(directory); !made)
-        throw Failure(fmt::format("can't make the directory {}: give another with -o", made.error().reason()));
+        throw Failure(fmt::format("can't create the directory {}: choose another with -o", made.error().reason()));
     return directory;
 }
 
@@ -113,7 +114,7 @@ void loadImages(const Options& options, const ImagesOptions& imagesOptions)
             description.set("type", type.empty() ? "unknown" : type);
             if (!options.json)
                 printLine(fmt::format("{:>9}  {}{}", found->second.size(), path.filename().string(),
-                                      type.empty() || type == "html" ? dim(" no image that is known here") : ""));
+                                      type.empty() || type == "html" ? dim(" not a known image format") : ""));
         }
         described.emplace_back(std::move(description));
     }
@@ -129,8 +130,8 @@ void loadImages(const Options& options, const ImagesOptions& imagesOptions)
                                   bytes, printable(directory.string()), latency.count())));
     if (saved.empty())
         throw Failure(
-            fmt::format("none of {} images came within {:g} s: the daemon's log says why (tavrind --log-level "
-                        "info); --within gives them longer",
+            fmt::format("none of {} images arrived within {:g} s. The daemon's log shows why (tavrind --log-level "
+                        "info); wait longer with --within",
                         images.size(), imagesOptions.within));
 }
 
@@ -139,15 +140,14 @@ void loadImages(const Options& options, const ImagesOptions& imagesOptions)
 void addImagesCommand(CLI::App& app, Command& chosen)
 {
     auto options = std::make_shared<ImagesOptions>();
-    CLI::App* command = app.add_subcommand("images", "Save the images that an answer names, as the daemon has them");
+    CLI::App* command = app.add_subcommand("images", "Save the images of an answer");
     command->add_option("query", options->query, "What to search for");
-    command->add_option("--url", options->urls, "An image's URL; may be repeated");
+    command->add_option("--url", options->urls, "URL of an image; may be repeated");
     command->add_option("--id", options->identifiers,
-                        "An image's identifier, for which the bag has the URL; may be repeated");
-    command
-        ->add_option("-o,--output", options->directory, "Where to save them; files that are there are left as they are")
+                        "Identifier of an image, which the bag maps to a URL; may be repeated");
+    command->add_option("-o,--output", options->directory, "Directory to save to; existing files are never overwritten")
         ->capture_default_str();
-    command->add_option("--within", options->within, "Seconds in which they must be there")
+    command->add_option("--within", options->within, "Seconds to wait for the images")
         ->check(CLI::Range(0.0, 60.0))
         ->capture_default_str();
     command->callback([options, &chosen] {

@@ -1,4 +1,4 @@
-// tavrinctl bag, sessions, status, stats: what the daemon has and does.
+// tavrinctl bag, sessions, status, stats: show the daemon's state.
 
 #include <charconv>
 #include <cmath>
@@ -27,7 +27,7 @@ std::string text(const Value& value)
     return string ? printable(*string) : platform::toJson(value);
 }
 
-/// "3 d 4 h", "2 min 5 s", "17 s"; a minus sign for the past.
+/// Formats a time span: "3 d 4 h", "2 min 5 s", "17 s"; with a minus sign if negative.
 std::string span(double seconds)
 {
     const auto total = static_cast<std::int64_t>(std::min(std::abs(seconds), 1e15));
@@ -73,20 +73,18 @@ void showBag(const Options& options)
         row("flight URL", urlText(bag.flightURL()));
         row("feedback URL", urlText(bag.feedbackURL()));
         for (const std::string& problem : bag.problems()) row("problem", printable(problem));
-        printLine(dim("as seen by " + printable(bag.userAgent()) + "; --json shows every key"));
+        printLine(dim("as " + printable(bag.userAgent()) + " sees it; --json shows every key"));
     }
     if (!answer.bag)
-        throw Failure(
-            fmt::format("the daemon has no bag ({}).\nCheck where it is fetched from: tavrinctl defaults read "
-                        "TAVBagURL",
-                        answer.error ? answer.error->reason() : "no reason given"));
+        throw Failure(fmt::format("the daemon has no bag ({}).\nCheck its URL: tavrinctl defaults read TAVBagURL",
+                                  answer.error ? answer.error->reason() : "no reason given"));
 }
 
 void showSessions(const Options& options)
 {
     const Value::Array sessions = valueOf(connect(options)->sessions());
     if (options.json) return printJson(sessions);
-    if (sessions.empty()) printLine("No client has introduced itself yet.");
+    if (sessions.empty()) printLine("No client has connected yet.");
     for (const Value& session : sessions)
         printLine(fmt::format("{:<36} {}", text(session["identifier"]), text(session["agent"])));
 }
@@ -128,7 +126,7 @@ void showStatus(const Options& options)
     }
 }
 
-/// The samples in OpenMetrics text, in their order. A counter's name is in the label "key", or else the metric's own.
+/// Parses the samples of OpenMetrics text in order. A counter's name is its label "key", or the metric's name.
 Dictionary samplesIn(std::string_view openMetrics)
 {
     Dictionary samples;
@@ -169,12 +167,12 @@ void addInspectCommands(CLI::App& app, Command& chosen)
         return command;
     };
     add("bag", "The service's configuration, as this client sees it", showBag);
-    add("sessions", "The clients that the daemon knows", showSessions);
-    add("status", "What the daemon is doing", showStatus);
+    add("sessions", "List the clients that connected", showSessions);
+    add("status", "Show the state of the daemon", showStatus);
     auto openMetrics = std::make_shared<bool>(false);
-    add("stats", "The daemon's counters", [openMetrics](const Options& options) {
+    add("stats", "Show the daemon's counters", [openMetrics](const Options& options) {
         showStatistics(options, *openMetrics);
-    })->add_flag("--openmetrics", *openMetrics, "As OpenMetrics text, for a collector");
+    })->add_flag("--openmetrics", *openMetrics, "Print OpenMetrics text for a collector");
 }
 
 } // namespace tavrin::ctl

@@ -1,4 +1,4 @@
-// tavrinctl search --interactive: what the daemon answers to each key.
+// tavrinctl search --interactive: shows the daemon's answer to each key.
 
 #include "tools/tavrinctl/InteractiveSearch.h"
 
@@ -16,9 +16,9 @@ namespace tavrin::ctl {
 
 namespace {
 
-constexpr std::size_t kKeysKept = 10; // more than are shown
+constexpr std::size_t kKeysKept = 10; // more than fit on the screen
 
-/// The search between the terminal and the daemon.
+/// Connects the terminal and the daemon.
 class InteractiveSearch {
 public:
     using MakeRequest = std::function<std::shared_ptr<TAVSearchRequest>(const std::string&)>;
@@ -27,7 +27,7 @@ public:
         : _makeRequest(makeRequest), _runner(options), _line(text)
     {}
 
-    /// Answers the signal that ended it, 0 for none.
+    /// Returns the signal that ended it, or 0.
     int run()
     {
         if (!_line.text().empty()) search();
@@ -48,7 +48,7 @@ private:
         _ended = input.ended || input.signal != 0;
         _changed = _changed || input.resized;
 
-        bool edited = false; // what comes at once, as a paste does, is one edit
+        bool edited = false; // keys that arrive together, as in a paste, are one edit
         for (const char key : input.keys) {
             if (_ended) return;
             edited = act(_line.feed(key)) || edited;
@@ -56,7 +56,7 @@ private:
         if (edited) search();
     }
 
-    /// Answers whether the text is to be searched for.
+    /// Returns true if the text is to be searched for.
     bool act(LineEditor::Action action)
     {
         using Action = LineEditor::Action;
@@ -84,7 +84,7 @@ private:
         _changed = true;
         const std::string& text = _line.text();
         if (text.empty()) {
-            _wanted = nullptr; // an answer on its way is for a text that is gone
+            _wanted = nullptr; // ignores the answer to an earlier text
             return showAnswer({});
         }
         _wanted = _runner.send(*_makeRequest(text), text, [this](const Exchange& exchange) {
@@ -122,7 +122,7 @@ private:
     };
 
     const MakeRequest& _makeRequest;
-    RequestRunner _runner; // before the terminal: without a daemon it isn't touched
+    RequestRunner _runner; // before the terminal, which stays untouched without a daemon
     Terminal _terminal;
     LineEditor _line;
     std::shared_ptr<Exchange> _wanted; // the latest key's
@@ -141,7 +141,7 @@ void searchInteractively(const Options& options, const std::string& text,
 {
     const int signal = InteractiveSearch(options, text, request).run();
     if (signal == 0) return;
-    // The terminal is as it was; now the program ends as the signal ends programs.
+    // The terminal is restored; die from the signal, so that the shell sees it.
     std::signal(signal, SIG_DFL);
     std::raise(signal);
 }

@@ -12,8 +12,8 @@ namespace tavrin::ctl {
 
 struct Options;
 
-/// Searches with every key that is typed into the terminal, beginning with `text`, until Ctrl-C or Ctrl-D. `request`
-/// makes the request for a text.
+/// Searches with every key typed into the terminal until Ctrl-C or Ctrl-D. `text` is the initial text, `request` makes
+/// the request for a text. Throws `Failure` without a daemon or a terminal.
 void searchInteractively(const Options& options, const std::string& text,
                          const std::function<std::shared_ptr<TAVSearchRequest>(const std::string&)>& request);
 

@@ -103,7 +103,7 @@ LineEditor::Action LineEditor::sequence(char final)
     }
 }
 
-/// Keeps the bytes of a character until it is whole. One that can't become whole is dropped.
+/// Collects the bytes of a character and inserts it once it is complete. Drops an invalid one.
 LineEditor::Action LineEditor::utf8(unsigned char byte)
 {
     if (byte < 0x80 || U8_IS_LEAD(byte))

@@ -1,4 +1,4 @@
-// tavrinctl zkw, more, card, lookup, flight, warm.
+// tavrinctl zkw, more, card, lookup, flight, warm: send the other kinds of request.
 
 #include <CLI/CLI.hpp>
 #include <fmt/format.h>
@@ -35,13 +35,13 @@ Exchange run(const Options& options, const RequestOptions& requestOptions, TAVRe
                                    : runner.run(request, requestOptions.what);
 }
 
-/// The first URL under `key` in the answer to a search for `query`: in a result set, or in its sections or results.
+/// Searches for `query` and returns the first URL under `key` in a result set, its sections or its results.
 Url urlFromSearch(const Options& options, const std::string& query, const char* key)
 {
     RequestRunner runner(options);
     const Exchange exchange =
         runner.run(*TAVSearchRequest::searchRequestWithString(query, StartSearchTrigger::NewCharacter), query);
-    if (exchange.outcome() != Outcome::Answered) throw Failure("the search before it: " + summary(exchange));
+    if (exchange.outcome() != Outcome::Answered) throw Failure("the search for the URL failed: " + summary(exchange));
     const Value sets = rawResponse(exchange);
     std::vector<Value> places;
     for (std::size_t i = 0; i < sets.count(); ++i) {
@@ -54,8 +54,7 @@ Url urlFromSearch(const Options& options, const std::string& query, const char* 
         const std::string* text = place[key].asString();
         if (auto url = text ? Url::parse(*text) : std::nullopt) return *url;
     }
-    throw Failure(
-        fmt::format("the answer to \"{}\" has no \"{}\": try another query, or give the URL itself", query, key));
+    throw Failure(fmt::format("the answer to \"{}\" has no \"{}\": try another query, or pass the URL", query, key));
 }
 
 Url urlFor(const Options& options, const std::string& what, const char* key)
@@ -63,7 +62,7 @@ Url urlFor(const Options& options, const std::string& what, const char* key)
     const bool isUrl = what.starts_with("https://") || what.starts_with("http://");
     if (!isUrl) return urlFromSearch(options, what, key);
     if (auto url = Url::parse(what)) return *url;
-    throw Failure(fmt::format("\"{}\" is no valid URL", what), 2);
+    throw Failure(fmt::format("\"{}\" is not a valid URL", what), 2);
 }
 
 std::optional<std::string> given(const std::string& text)
@@ -71,34 +70,34 @@ std::optional<std::string> given(const std::string& text)
     return text.empty() ? std::nullopt : std::optional(text);
 }
 
-/// A command with the options that all of these share.
+/// Adds a command with the options that these commands share.
 CLI::App* add(CLI::App& app, const char* name, const char* description, const std::shared_ptr<RequestOptions>& options)
 {
     CLI::App* command = app.add_subcommand(name, description);
     command->add_flag("-v,--verbose", options->verbose, "Show the HTTP request and response");
-    command->add_option("--item", options->items, "NAME=VALUE to add to the request's query; may be repeated");
+    command->add_option("--item", options->items, "NAME=VALUE to add to the URL's query; may be repeated");
     return command;
 }
 
-/// As a client whose search view appears: the daemon opens the connection to the service, unless it is warm.
+/// Reports that a search view appears, which makes the daemon open its connection to the service.
 void warm(const Options& options)
 {
     const Session session = openSession(options);
     ZRSearchViewAppearFeedback appeared;
     appeared.viewAppearEvent = SearchViewAppearTrigger::KeyboardShortcut;
     session.client->reportEvent("searchViewDidAppear", 0, appeared);
-    (void)valueOf(session.client->status()); // calls are taken in order: the event has been, by now
+    (void)valueOf(session.client->status()); // calls are handled in order, so the event was handled
     if (options.json)
         printJson(platform::Dictionary{{"reported", appeared.className()}});
     else
-        printLine("The search view has appeared; the daemon's log tells whether the connection was warm already.");
+        printLine("Reported that the search view appeared; the daemon's log shows if the connection was already warm.");
 }
 
 } // namespace
 
 void addOtherRequestCommands(CLI::App& app, Command& chosen)
 {
-    app.add_subcommand("warm", "Open the connection to the service ahead of a search")->callback([&chosen] {
+    app.add_subcommand("warm", "Open the connection to the service before a search")->callback([&chosen] {
         chosen = warm;
     });
 
@@ -108,39 +107,41 @@ void addOtherRequestCommands(CLI::App& app, Command& chosen)
     };
 
     auto zkw = std::make_shared<RequestOptions>();
-    onChosen(add(app, "zkw", "Suggestions before anything is typed", zkw), [zkw](const Options& common) {
+    onChosen(add(app, "zkw", "Show suggestions for an empty query", zkw), [zkw](const Options& common) {
         TAVZeroKeywordRequest request;
         return run(common, *zkw, request);
     });
 
-    // Two that follow a URL of an earlier answer, and are served over the endpoint too.
+    // Requests for a URL of an earlier answer; the endpoint serves these, too.
     const auto addFollowing = [&](const char* name, const char* description, auto follow) {
         auto options = std::make_shared<RequestOptions>();
         CLI::App* command = add(app, name, description, options);
-        command->add_option("what", options->what, "The URL in an earlier answer, or a query to search for first")
+        command->add_option("what", options->what, "URL from an earlier answer, or a query to search for first")
             ->required();
-        command->add_flag("--endpoint", options->endpoint, "Ask over the endpoint, not the connection");
+        command->add_flag("--endpoint", options->endpoint,
+                          "Send the request to the endpoint instead of the connection");
         onChosen(command, [options, follow](const Options& common) { return follow(common, *options); });
     };
-    addFollowing("more", "More results of a section", [](const Options& common, const RequestOptions& more) {
+    addFollowing("more", "Show more results of a section", [](const Options& common, const RequestOptions& more) {
         TAVMoreResultsRequest request;
         request.moreResultsURL = urlFor(common, more.what, "more_results_url");
         return run(common, more, request);
     });
-    addFollowing("card", "A result's card", [](const Options& common, const RequestOptions& card) {
+    addFollowing("card", "Show the card of a result", [](const Options& common, const RequestOptions& card) {
         TAVCardRequest request;
         request.cardURL = urlFor(common, card.what, "card_url");
         return run(common, card, request);
     });
 
     auto lookup = std::make_shared<RequestOptions>();
-    CLI::App* lookupCommand = add(app, "lookup", "Look words of a text up", lookup);
-    lookupCommand->add_option("words", lookup->what, "The words")->required();
-    lookupCommand->add_option("--context", lookup->context, "The text around them");
-    lookupCommand->add_option("--client-context", lookup->clientContext, "Where the text stands: mail, article, …");
-    lookupCommand->add_option("--domain", lookup->domain, "Domain of the hint that was tapped");
+    CLI::App* lookupCommand = add(app, "lookup", "Look up words of a text", lookup);
+    lookupCommand->add_option("words", lookup->what, "Words to look up")->required();
+    lookupCommand->add_option("--context", lookup->context, "Text around the words");
+    lookupCommand->add_option("--client-context", lookup->clientContext, "Kind of the text: mail, article, …");
+    lookupCommand->add_option("--domain", lookup->domain, "Domain of the tapped hint");
     lookupCommand
-        ->add_option("--selection", lookup->selection, "How they were chosen: 0 default, 1 explicit, 2 by a hint")
+        ->add_option("--selection", lookup->selection,
+                     "How the words were selected: 0 default, 1 explicit, 2 by a hint")
         ->check(CLI::Range(0, 2));
     onChosen(lookupCommand, [lookup](const Options& common) {
         TAVLookupRequest request;
@@ -154,9 +155,9 @@ void addOtherRequestCommands(CLI::App& app, Command& chosen)
     });
 
     auto flight = std::make_shared<RequestOptions>();
-    CLI::App* flightCommand = add(app, "flight", "A flight by its number, or flights that match", flight);
-    flightCommand->add_option("flight", flight->what, "Its number, or what to search for")->required();
-    flightCommand->add_flag("--search", flight->searchFlights, "Search for flights that match");
+    CLI::App* flightCommand = add(app, "flight", "Show a flight by its number, or search for flights", flight);
+    flightCommand->add_option("flight", flight->what, "Flight number, or text to search for")->required();
+    flightCommand->add_flag("--search", flight->searchFlights, "Search for flights instead of one number");
     onChosen(flightCommand, [flight](const Options& common) {
         std::unique_ptr<TAVRequest> request;
         if (flight->searchFlights)

@@ -99,7 +99,7 @@ std::vector<std::shared_ptr<TAVQueryItem>> queryItems(const std::vector<std::str
     std::vector<std::shared_ptr<TAVQueryItem>> items;
     for (const std::string& text : texts) {
         const auto equals = text.find('=');
-        if (equals == 0 || text.empty()) throw Failure(fmt::format("--item \"{}\": give it as NAME=VALUE", text), 2);
+        if (equals == 0 || text.empty()) throw Failure(fmt::format("--item \"{}\" is not NAME=VALUE", text), 2);
         std::optional<std::string> value;
         if (equals != std::string::npos) value = text.substr(equals + 1);
         items.push_back(std::make_shared<TAVQueryItem>(text.substr(0, equals), std::move(value)));
@@ -115,7 +115,7 @@ void finish(const Options& options, const Exchange& exchange)
         printLine(summary(exchange));
         printAnswer(exchange, options.limit);
     }
-    if (exchange.outcome() == Outcome::Failed) throw Failure("", 1); // said already
+    if (exchange.outcome() == Outcome::Failed) throw Failure("", 1); // the summary has the reason
 }
 
 } // namespace tavrin::ctl

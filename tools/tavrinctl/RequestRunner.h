@@ -16,25 +16,25 @@ struct TAVRequest;
 
 namespace tavrin::ctl {
 
-/// Sends requests over one configured connection, numbers and times them. One thread.
+/// Sends requests over one configured connection, numbers them and measures their latency. Not thread-safe.
 class RequestRunner {
 public:
-    /// `showHttp`: the HTTP requests and responses of verbose replies are to be shown.
+    /// With `showHttp` the HTTP request and response of a verbose reply are shown.
     explicit RequestRunner(const Options& options, bool showHttp = false);
 
     using Shown = std::function<void(const Exchange&)>;
-    /// Sends a request; `answered` is called when its answer is there, inside one of the waiting calls below.
+    /// Sends a request. `answered` is called with the answer from inside one of the waiting calls below.
     std::shared_ptr<Exchange> send(TAVRequest& request, std::string query, Shown answered = {});
-    /// Takes answers until `done()`, which is asked again after each of them, and whenever `descriptor` can be read.
-    /// False: the daemon closed the connection.
+    /// Receives answers until `done()`, which is called after each answer and when `descriptor` is readable. Returns
+    /// false if the daemon closed the connection.
     [[nodiscard]] bool takeAnswers(const std::function<bool()>& done, int descriptor);
-    /// Takes answers for a while.
+    /// Receives answers for `duration`.
     void pause(std::chrono::duration<double, std::milli> duration);
-    /// Takes answers until every request has one; those without one in time say so.
+    /// Receives answers until every request has one. A request without an answer in time gets a `problem`.
     void waitForAll();
-    /// Sends a request and waits for its answer.
+    /// Sends a request and blocks until its answer or the time-out.
     Exchange run(TAVRequest& request, std::string query);
-    /// The same through the endpoint, as views do that outlive the search.
+    /// The same through the endpoint, as views do that outlive their search.
     Exchange runThroughEndpoint(TAVRequest& request, std::string query);
 
 private:
@@ -46,10 +46,10 @@ private:
     std::int64_t _lastQueryId = 0;
 };
 
-/// "name=value" texts as query items; a `Failure` for one without a name.
+/// Parses "name=value" texts. Throws `Failure` for a text without a name.
 [[nodiscard]] std::vector<std::shared_ptr<TAVQueryItem>> queryItems(const std::vector<std::string>& texts);
 
-/// Shows an exchange as the options say; a `Failure` where it failed.
+/// Prints an exchange. Throws `Failure` if it failed.
 void finish(const Options& options, const Exchange& exchange);
 
 } // namespace tavrin::ctl

@@ -1,4 +1,4 @@
-// tavrinctl resource: the files that the daemon downloads for its clients.
+// tavrinctl resource: shows the files that the daemon downloads for its clients.
 
 #include <ctime>
 #include <unistd.h>
@@ -48,7 +48,7 @@ void fetchResource(const Options& options, const std::string& identifier, const 
     if (!output.empty()) {
         const auto path = std::filesystem::absolute(output).lexically_normal();
         if (const auto saved = platform::makeSystemFiles()->copy(path, answer.file); !saved)
-            throw Failure(fmt::format("{} can't be written: {}", path.string(), saved.error().reason()));
+            throw Failure(fmt::format("can't write {}: {}", path.string(), saved.error().reason()));
     }
     if (options.json)
         printJson(describe(identifier, answer, {}));
@@ -61,12 +61,12 @@ void fetchResource(const Options& options, const std::string& identifier, const 
 void addResourceCommand(CLI::App& app, Command& chosen)
 {
     CLI::App* command =
-        app.add_subcommand("resource", "A file that the daemon downloaded; without a name, all of them");
+        app.add_subcommand("resource", "Print a file that the daemon downloaded; list all without a name");
     auto identifier = std::make_shared<std::string>();
     auto output = std::make_shared<std::string>();
-    auto* name = command->add_option("name", *identifier, "The resource's key in the bag");
-    command->add_option("-o,--output", *output, "File to write, in place of standard output")->needs(name);
-    command->footer("With --json what is known of the file is shown, and its contents only go to -o.");
+    auto* name = command->add_option("name", *identifier, "Key of the resource in the bag");
+    command->add_option("-o,--output", *output, "File to write instead of standard output")->needs(name);
+    command->footer("With --json prints the file's attributes; its contents are only written to the file of -o.");
     command->callback([&chosen, identifier, output] {
         chosen = [identifier, output](const Options& options) {
             if (identifier->empty()) return listResources(options);

@@ -25,7 +25,7 @@ bool drivesTerminals(std::string_view text)
                                    const auto byte = static_cast<unsigned char>(c);
                                    return byte == 0x7f || (byte < 0x20 && c != '\n' && c != '\r' && c != '\t');
                                }) ||
-           text.find("\xc2\x9b") != std::string_view::npos; // the one beyond ASCII that begins a command
+           text.find("\xc2\x9b") != std::string_view::npos; // CSI, the only control sequence introducer beyond ASCII
 }
 
 } // namespace
@@ -39,15 +39,15 @@ std::string whyNotThere(const std::string& identifier, const TAVResourceAnswer& 
     if (answer.error && answer.error->code != TAVErrorNotFound)
         return fmt::format("the daemon can't read {}: {}", name, printable(answer.error->reason()));
     if (!bag.bag)
-        return fmt::format("{} is not there, and the daemon has no bag, which lists the resources.\nCheck where it is "
-                           "fetched from: tavrinctl defaults read TAVBagURL",
+        return fmt::format("{} is missing, because the daemon has no bag, which lists the resources.\nCheck its URL: "
+                           "tavrinctl defaults read TAVBagURL",
                            name);
     const auto url = bag.bag->resourceURL(identifier);
     if (!url)
-        return fmt::format("the bag lists no {}, so that none is downloaded; \"tavrinctl bag --json\" shows the bag",
-                           name);
-    return fmt::format("{} is not downloaded yet. It comes from {}\na minute after the bag, over a network that isn't "
-                       "metered; the daemon's log says what holds it up.",
+        return fmt::format(
+            "the bag lists no {}, so the daemon does not download it; \"tavrinctl bag --json\" shows the bag", name);
+    return fmt::format("{} is not downloaded yet. The daemon downloads it from {}\na minute after it gets a bag, on a "
+                       "network that is not metered; its log shows failures.",
                        name, printable(url->string()));
 }
 
@@ -68,15 +68,14 @@ void copyResource(const platform::FileHandle& file, int output, bool terminal)
     std::array<char, 64 * 1024> chunk;
     for (off_t offset = 0;;) {
         const ssize_t count = pread(file.fd(), chunk.data(), chunk.size(), offset);
-        if (count < 0) throw failed("the resource can't be read");
+        if (count < 0) throw failed("can't read the resource");
         if (count == 0) return;
         offset += count;
         std::string_view left(chunk.data(), static_cast<std::size_t>(count));
-        if (terminal && drivesTerminals(left))
-            throw Failure("the resource is no text that a terminal can show; -o FILE saves it");
+        if (terminal && drivesTerminals(left)) throw Failure("the resource is not plain text; save it with -o FILE");
         while (!left.empty()) {
             const ssize_t written = write(output, left.data(), left.size());
-            if (written < 0 && errno != EINTR) throw failed("the resource can't be written");
+            if (written < 0 && errno != EINTR) throw failed("can't write the resource");
             left.remove_prefix(static_cast<std::size_t>(std::max<ssize_t>(written, 0)));
         }
     }

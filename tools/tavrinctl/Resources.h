@@ -7,17 +7,17 @@
 
 namespace tavrin::ctl {
 
-/// Whether the file of a resource is to be had, and if not, why and what to do about it. `bag` is the bag of this
-/// client. Empty for a file that is there.
+/// Explains why a resource has no file, and what to do about it. Returns an empty string if it has one. `bag` is this
+/// client's bag.
 [[nodiscard]] std::string whyNotThere(const std::string& identifier, const TAVResourceAnswer& answer,
                                       const TAVBagAnswer& bag);
 
-/// {"identifier", "size", "modified", "created"} of a file that is there, else {"identifier", "error"}.
+/// Returns {"identifier", "size", "modified", "created"}, or {"identifier", "error"} if there is no file.
 [[nodiscard]] platform::Dictionary describe(const std::string& identifier, const TAVResourceAnswer& answer,
                                             const TAVBagAnswer& bag);
 
-/// Copies a file to a descriptor, from its start. A `Failure` where it can't be read or written; on a terminal also
-/// where it has characters that would drive that.
+/// Copies a file from its start to a descriptor. Throws `Failure` if reading or writing fails, or if `terminal` is set
+/// and the file has control characters.
 void copyResource(const platform::FileHandle& file, int output, bool terminal);
 
 } // namespace tavrin::ctl

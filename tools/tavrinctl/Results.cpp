@@ -46,12 +46,12 @@ Value valueOfError(const platform::Error& error)
     return Value::dictionaryOf({{"domain", error.domain}, {"code", error.code}, {"reason", error.reason()}});
 }
 
-/// An error's reason, and what to look at where that helps.
+/// Returns the error's reason, and what to check next if that is known.
 std::string explain(const platform::Error& error)
 {
     const std::string reason = printable(error.reason().empty() ? error.description() : error.reason());
     if (error.domain == TAVErrorDomain && error.code == TAVErrorTimeout)
-        return reason + " (no bag yet: \"tavrinctl defaults read TAVBagURL\" tells where it is fetched from)";
+        return reason + " (no bag yet; check its URL with \"tavrinctl defaults read TAVBagURL\")";
     return reason;
 }
 
@@ -101,7 +101,7 @@ std::string_view mark(const Exchange& exchange)
 {
     const Outcome outcome = exchange.outcome();
     if (outcome != Outcome::Answered || !exchange.answer->reply->httpRequest) return outcomeName(outcome);
-    // From memory there is the request that once fetched the answer, and no response.
+    // An answer from the cache has the request that fetched it, and no response.
     return exchange.answer->reply->httpResponse ? "network" : "cache";
 }
 
@@ -113,7 +113,7 @@ std::string explanation(const Exchange& exchange)
         return fmt::format("{}, {}", counted(resultsIn(raw).size(), "result"), counted(raw.count(), "set"));
     }
     case Outcome::Skipped: return exchange.skipReason;
-    case Outcome::Overtaken: return "came after a later key, delivered empty";
+    case Outcome::Overtaken: return "overtaken by a later key and delivered empty";
     case Outcome::Failed: break;
     }
     return exchange.answer ? explain(*exchange.answer->error) : exchange.problem;
@@ -122,7 +122,7 @@ std::string explanation(const Exchange& exchange)
 std::string skipReason(const TAVBagAnswer& answer, std::string_view query)
 {
     if (!answer.bag) return {};
-    if (!answer.bag->isEnabled()) return "the bag has search switched off";
+    if (!answer.bag->isEnabled()) return "the bag disables search";
     if (platform::utf16Length(query) < answer.bag->minimumQueryLength())
         return fmt::format("shorter than the bag's minimum of {}", answer.bag->minimumQueryLength());
     return {};

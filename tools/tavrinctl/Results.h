@@ -8,7 +8,7 @@
 
 namespace tavrin::ctl {
 
-/// What became of a request, as a user would say it.
+/// The outcome of a request.
 enum class Outcome {
     Answered,
     Skipped,   ///< the daemon had a reason not to ask the service
@@ -33,35 +33,35 @@ struct Exchange {
     [[nodiscard]] bool waiting() const { return !answer && problem.empty(); }
 };
 
-/// "network" or "cache", where the answer came from; "answered" where a reply that isn't verbose doesn't tell. Else its
-/// outcome's name.
+/// Returns "network" or "cache" for the source of an answer, "answered" if the reply is not verbose and hides its
+/// source, and the outcome's name for any other outcome.
 [[nodiscard]] std::string_view mark(const Exchange& exchange);
-/// How much came, or why nothing did; may be empty.
+/// Returns the number of results, or the reason for having none; may be empty.
 [[nodiscard]] std::string explanation(const Exchange& exchange);
 
-/// Why the daemon doesn't ask the service for `query` under this bag; empty if it does.
+/// Explains why the daemon does not send `query` under this bag; empty if it does.
 [[nodiscard]] std::string skipReason(const TAVBagAnswer& bag, std::string_view query);
 
-/// A result as it is listed.
+/// A result in a list.
 struct ListedResult {
     std::string section;
     std::string title;
     std::string url;
     std::string description;
 };
-/// The results of an answer, in order: what has a "title" in the "results" of a result set.
+/// Returns every entry with a "title" in the "results" of each result set, in order.
 [[nodiscard]] std::vector<ListedResult> resultsIn(const platform::Value& rawResponse);
-/// The texts of its suggestions.
+/// Returns the texts of all suggestions.
 [[nodiscard]] std::vector<std::string> suggestionsIn(const platform::Value& rawResponse);
-/// The service's answer as a value; null where there is none.
+/// Returns the service's answer as a value; null if there is none.
 [[nodiscard]] platform::Value rawResponse(const Exchange& exchange);
 
-/// {"query", "outcome", "latency_ms", "results", …} for scripts.
+/// Returns {"query", "outcome", "latency_ms", "results", …} for scripts.
 [[nodiscard]] platform::Value describe(const Exchange& exchange);
-/// One line: what was asked, what became of it, how long it took.
+/// Returns one line with the query, the latency and the outcome.
 [[nodiscard]] std::string summary(const Exchange& exchange);
-/// Results by section, suggestions, and the HTTP request and response where they are to be shown. At most `limit`
-/// results; 0 is all.
+/// Prints at most `limit` results by section (0 for all), the suggestions, and the HTTP request and response if the
+/// exchange has `showHttp`.
 void printAnswer(const Exchange& exchange, std::size_t limit);
 
 } // namespace tavrin::ctl

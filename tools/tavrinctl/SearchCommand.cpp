@@ -1,4 +1,4 @@
-// tavrinctl search: one query, one for every key as a user would type it, or one for every key that is typed.
+// tavrinctl search: sends one query, one for each prefix of it, or one for each key that the user types.
 
 #include <chrono>
 
@@ -25,7 +25,7 @@ struct SearchOptions {
     std::vector<std::string> items;
 };
 
-/// The query as it grows key by key: its prefixes by Unicode character.
+/// Returns the prefixes of the query by code point, as a user types it.
 std::vector<std::string> prefixes(const std::string& query)
 {
     std::vector<std::string> result;
@@ -40,7 +40,7 @@ void search(const Options& options, const SearchOptions& searchOptions)
 {
     const auto request = [&](const std::string& query) {
         auto search = TAVSearchRequest::searchRequestWithString(query, StartSearchTrigger::NewCharacter);
-        search->verboseReply = true; // it tells the cache's answers from the service's
+        search->verboseReply = true; // shows if the cache or the service answered
         search->queryItems = queryItems(searchOptions.items);
         return search;
     };
@@ -49,7 +49,7 @@ void search(const Options& options, const SearchOptions& searchOptions)
     RequestRunner runner(options, searchOptions.verbose);
     if (!searchOptions.typed) return finish(options, runner.run(*request(searchOptions.query), searchOptions.query));
 
-    // Lines come as answers do; a later key may overtake an earlier one's.
+    // Prints each answer when it arrives; a later key may overtake an earlier one.
     const auto show = [&](const Exchange& exchange) {
         if (!options.json) printLine(summary(exchange));
     };
@@ -75,17 +75,17 @@ void search(const Options& options, const SearchOptions& searchOptions)
 void addSearchCommand(CLI::App& app, Command& chosen)
 {
     auto options = std::make_shared<SearchOptions>();
-    CLI::App* command = app.add_subcommand("search", "Search, once or as a user types");
-    command->add_option("query", options->query, "What to search for; with --interactive, what to begin with");
-    CLI::Option* interactive = command->add_flag("-i,--interactive", options->interactive,
-                                                 "Type in the terminal, and see what every key brings");
-    command->add_flag("--typed", options->typed, "Send a request for each key, without waiting for the answers")
+    CLI::App* command = app.add_subcommand("search", "Search once, or with every key");
+    command->add_option("query", options->query, "Text to search for; initial text with --interactive");
+    CLI::Option* interactive =
+        command->add_flag("-i,--interactive", options->interactive, "Search with every key typed into the terminal");
+    command->add_flag("--typed", options->typed, "Send a request for each key without waiting for answers")
         ->excludes(interactive);
     command->add_option("--interval", options->interval, "Milliseconds between keys")
         ->check(CLI::Range(0.0, 60000.0))
         ->capture_default_str();
     command->add_flag("-v,--verbose", options->verbose, "Show the HTTP request and response");
-    command->add_option("--item", options->items, "NAME=VALUE to add to the request's query; may be repeated");
+    command->add_option("--item", options->items, "NAME=VALUE to add to the URL's query; may be repeated");
     command->callback([options, &chosen] {
         if (options->query.empty() && !options->interactive) throw CLI::RequiredError("query, or --interactive,");
         chosen = [options](const Options& common) { search(common, *options); };

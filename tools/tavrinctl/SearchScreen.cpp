@@ -19,9 +19,9 @@ constexpr std::string_view kPrompt = "Search: ";
 constexpr std::string_view kHelp = "Ctrl-U clears, arrows move and scroll, Ctrl-C ends";
 constexpr int kMostKeys = 6;
 
-/// Rows for each part, from top to bottom.
+/// The number of rows of each part, from top to bottom.
 struct Rows {
-    int gap = 0; ///< under the line that is typed
+    int gap = 0; ///< below the typed line
     int answer = 0;
     int keys = 0;
     bool help = false;
@@ -30,7 +30,7 @@ struct Rows {
 Rows share(int rows, std::size_t keys)
 {
     Rows result;
-    int left = rows - 1; // the line that is typed
+    int left = rows - 1; // the typed line
     result.help = left >= 6;
     if (result.help) --left;
     const int most = std::min(kMostKeys, left / 3);
@@ -41,7 +41,7 @@ Rows share(int rows, std::size_t keys)
     return result;
 }
 
-/// The part of the text around the cursor that fits, which the cursor is in.
+/// The part of the text around the cursor that fits.
 struct Part {
     std::string text;
     int cursorColumn;
@@ -112,11 +112,11 @@ ScreenFrame layOut(const SearchView& view, ScreenSize size)
 
 std::string drawn(const ScreenFrame& frame, bool colours)
 {
-    std::string bytes = "\033[?25l"; // no cursor while it moves about
+    std::string bytes = "\033[?25l"; // hides the cursor while it moves
     for (std::size_t row = 0; row < frame.lines.size(); ++row) {
         const ScreenLine& line = frame.lines[row];
         const char* style = line.style == Style::Bold ? "\033[1m" : line.style == Style::Dim ? "\033[2m" : "";
-        // Cleared first: behind a full line the cursor is still on its last character.
+        // Clears first: after a full line the cursor is still on its last character.
         bytes += fmt::format("\033[{};1H\033[K", row + 1);
         bytes += colours && *style ? style + line.text + "\033[0m" : line.text;
     }

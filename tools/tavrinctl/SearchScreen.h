@@ -7,7 +7,7 @@ namespace tavrin::ctl {
 
 struct Exchange;
 
-/// A line on the screen, in one style.
+/// A line on the screen with one style.
 struct ScreenLine {
     enum class Style { Plain, Bold, Dim };
     std::string text;
@@ -20,8 +20,8 @@ struct ScreenSize {
     int rows = 24;
 };
 
-/// What a search as one types shows: the line that is typed, the results of the newest answer, and what became of the
-/// latest keys, the newest last.
+/// The contents of the screen: the typed line, the results of the newest answer, and the outcomes of the latest keys,
+/// the newest last.
 struct SearchView {
     std::string text;       ///< printable
     std::size_t cursor = 0; ///< bytes of the text before it
@@ -30,24 +30,24 @@ struct SearchView {
     std::vector<std::string> keys;
 };
 
-/// What is drawn: no line is wider than the screen, and there are no more of them than it has rows.
+/// The lines to draw: at most as many as the screen has rows, none wider than the screen.
 struct ScreenFrame {
     std::vector<ScreenLine> lines;
     int cursorColumn = 0; ///< in the first line; the first is 0
 };
 
-/// Lays the view out. What doesn't fit is left out: keys first, then results; the line that is typed is always there,
-/// the part around the cursor where it is too long.
+/// Lays out the view. Drops what does not fit, keys first, then results. The typed line is always shown, clipped around
+/// the cursor.
 [[nodiscard]] ScreenFrame layOut(const SearchView& view, ScreenSize size);
-/// How many lines of the answer there is room for.
+/// Returns the number of rows for the answer.
 [[nodiscard]] std::size_t answerRows(std::size_t keys, ScreenSize size);
 
-/// What a terminal is sent to show the frame in place of what it shows; `colours` says whether styles are.
+/// Returns the bytes that make a terminal show the frame; with styles if `colours` is set.
 [[nodiscard]] std::string drawn(const ScreenFrame& frame, bool colours);
 
-/// The lines of an answer: results by section, suggestions. What it is where it has none.
+/// Returns the lines of an answer: results by section and suggestions, or the reason for having none.
 [[nodiscard]] std::vector<ScreenLine> answerLines(const Exchange& exchange);
-/// The line of a key: the query, network, cache or skipped, the latency, and what came.
+/// Returns the line of a key: the query, its source or outcome, the latency and the number of results.
 [[nodiscard]] std::string keyLine(const Exchange& exchange);
 
 } // namespace tavrin::ctl

@@ -1,4 +1,4 @@
-// tavrinctl session: what a session file holds. Needs no daemon.
+// tavrinctl session: shows the contents of a session file. Needs no daemon.
 
 #include <CLI/CLI.hpp>
 #include <fmt/chrono.h>
@@ -75,7 +75,7 @@ void show(const Options& options, const std::string& path)
         printEvents(file);
     }
     if (file.damage)
-        throw Failure(fmt::format("{} is damaged at offset {}: {}; {} events before it can be read", path,
+        throw Failure(fmt::format("{} is damaged at offset {}: {}; {} events before that are intact", path,
                                   file.damage->offset, file.damage->reason, file.events.size()));
 }
 
@@ -83,11 +83,11 @@ void show(const Options& options, const std::string& path)
 
 void addSessionCommand(CLI::App& app, Command& chosen)
 {
-    CLI::App* command = app.add_subcommand("session", "What a session file holds; needs no daemon");
+    CLI::App* command = app.add_subcommand("session", "Show the contents of a session file; needs no daemon");
     auto file = std::make_shared<std::string>();
     command->add_option("file", *file, "$XDG_CACHE_HOME/com.quorvane.tavrind/session.N")->required();
     command->footer(
-        "Times count from the first event. A damaged file is shown up to the damage; the status is 1 then.");
+        "Times are relative to the first event. A damaged file is shown up to the damage, with exit status 1.");
     command->callback([&chosen, file] { chosen = [file](const Options& options) { show(options, *file); }; });
 }
 

@@ -16,7 +16,7 @@ namespace {
 
 constexpr std::size_t kLengthSize = sizeof(std::uint64_t);
 
-/// The archive of the record at `offset`, without its length.
+/// Returns the archive of the record at `offset`, without its length.
 std::expected<std::string_view, std::string> archiveAt(std::string_view bytes, std::size_t offset)
 {
     const std::size_t left = bytes.size() - offset;
@@ -36,7 +36,7 @@ bool isOfClass(const Value& value, std::string_view name)
     return className && *className == name;
 }
 
-/// Takes the next record; answers what is wrong with it otherwise.
+/// Consumes the next record. Returns what is wrong with it, if anything.
 std::optional<std::string> take(SessionFile& file, std::size_t offset, std::string_view archive)
 {
     auto value = platform::valueFromArchive(archive);

@@ -10,15 +10,15 @@
 
 namespace tavrin::ctl {
 
-/// A session file, as far as it can be read: each record is its length, 8 bytes in the machine's order, and an archive.
-/// The first is the version of the daemon that wrote it, the second the session, each further one an event.
+/// The readable part of a session file. Each record is its length, 8 bytes in native order, and an archive. The first
+/// record is the version of the daemon that wrote the file, the second the session, each further one an event.
 struct SessionFile {
     struct Event {
         std::size_t offset = 0; ///< of the record in the file
         std::size_t size = 0;   ///< of the record, its length field included
         platform::Value value;  ///< a record of class "TavrinFeedback"
     };
-    /// The first thing that can't be read. The daemon reads nothing from here on either.
+    /// The first unreadable record. The daemon also stops reading here.
     struct Damage {
         std::size_t offset = 0;
         std::string reason;

@@ -14,7 +14,7 @@ namespace tavrin::ctl {
 
 namespace {
 
-// The other screen, and no wrapping of long lines.
+// The alternate screen, without wrapping of long lines.
 constexpr const char* kEnter = "\033[?1049h\033[?7l\033[H\033[2J";
 constexpr const char* kLeave = "\033[0m\033[?25h\033[?7h\033[?1049l";
 
@@ -24,7 +24,7 @@ constexpr int kEnding[]{SIGINT, SIGTERM, SIGHUP, SIGQUIT};
 void watch(int epoll, int descriptor)
 {
     epoll_event event{.events = EPOLLIN, .data = {.fd = descriptor}};
-    if (epoll_ctl(epoll, EPOLL_CTL_ADD, descriptor, &event) != 0) throw Failure("the terminal can't be watched");
+    if (epoll_ctl(epoll, EPOLL_CTL_ADD, descriptor, &event) != 0) throw Failure("can't watch the terminal");
 }
 
 } // namespace
@@ -32,7 +32,7 @@ void watch(int epoll, int descriptor)
 Terminal::Terminal()
 {
     if (isatty(STDIN_FILENO) != 1 || isatty(STDOUT_FILENO) != 1 || tcgetattr(STDIN_FILENO, &_original) != 0)
-        throw Failure("--interactive needs a terminal; for scripts there is --typed", 2);
+        throw Failure("--interactive needs a terminal; use --typed in scripts", 2);
     sigemptyset(&_signals);
     sigaddset(&_signals, SIGWINCH);
     for (const int signal : kEnding) sigaddset(&_signals, signal);
@@ -56,7 +56,7 @@ void Terminal::enter()
 {
     termios raw = _original;
     cfmakeraw(&raw);
-    raw.c_cc[VMIN] = 0; // reading doesn't wait
+    raw.c_cc[VMIN] = 0; // reads never block
     raw.c_cc[VTIME] = 0;
     tcsetattr(STDIN_FILENO, TCSADRAIN, &raw);
     show(kEnter);
@@ -67,7 +67,7 @@ void Terminal::leave()
 {
     if (!std::exchange(_entered, false)) return;
     show(kLeave);
-    tcsetattr(STDIN_FILENO, TCSAFLUSH, &_original); // keys that nobody read are not for the shell
+    tcsetattr(STDIN_FILENO, TCSAFLUSH, &_original); // drops unread keys, which are not meant for the shell
 }
 
 Terminal::Input Terminal::read()
@@ -110,7 +110,7 @@ void Terminal::show(const std::string& bytes)
         if (written > 0)
             done += static_cast<std::size_t>(written);
         else if (errno != EINTR)
-            return; // a terminal that is gone shows nothing
+            return; // the terminal was closed
     }
 }
 

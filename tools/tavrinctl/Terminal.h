@@ -7,12 +7,11 @@
 
 namespace tavrin::ctl {
 
-/// The terminal taken over for a full screen: keys come as they are typed, without echo, and what is shown is on the
-/// terminal's other screen. Destroyed, or while suspended, everything is as it was, whatever ended the program short of
-/// SIGKILL: SIGINT, SIGTERM and SIGHUP come as input. One at a time, one thread.
+/// Puts the terminal into raw mode on its alternate screen. The destructor and `suspend` restore it; SIGINT, SIGTERM
+/// and SIGHUP arrive as input, so that only SIGKILL leaves the terminal changed. At most one instance; not thread-safe.
 class Terminal {
 public:
-    /// A `Failure` where standard input and output are no terminal.
+    /// Throws `Failure` if standard input or output is not a terminal.
     Terminal();
     ~Terminal();
     Terminal(const Terminal&) = delete;
@@ -21,18 +20,18 @@ public:
     struct Input {
         std::string keys;
         bool resized = false;
-        bool ended = false; ///< the terminal is gone
-        int signal = 0;     ///< that asks the program to end; 0 for none
+        bool ended = false; ///< the terminal was closed
+        int signal = 0;     ///< signal that asks the program to end; 0 if none
     };
-    /// What came since the last time; doesn't wait.
+    /// Returns the input since the last call without blocking.
     [[nodiscard]] Input read();
-    /// Can be read when there is input.
+    /// Becomes readable when there is input.
     [[nodiscard]] int descriptor() const { return _input; }
 
     [[nodiscard]] ScreenSize size() const;
     void show(const std::string& bytes);
-    /// Gives the terminal back and stops the program, as Ctrl-Z does; returns when it is continued. Where it
-    /// was to end meanwhile the terminal stays as it is.
+    /// Restores the terminal and stops the process, as Ctrl-Z does; returns after SIGCONT. If a signal asked the
+    /// program to end meanwhile, the terminal stays restored.
     void suspend();
 
 private:

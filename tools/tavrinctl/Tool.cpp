@@ -17,7 +17,7 @@ std::unique_ptr<TAVClient> connect(const Options& options)
     if (!client)
         throw Failure(
             fmt::format("no daemon answers at {} ({}).\nStart it with \"systemctl --user start tavrind.socket\", or "
-                        "run tavrind; --address names another place.",
+                        "run tavrind; --address selects another socket.",
                         options.address, client.error().reason()));
     (*client)->setTimeout(platform::durationFromSeconds(options.timeout));
     return std::move(*client);
@@ -52,7 +52,7 @@ void printLine(const std::string& text)
 {
     std::fwrite(text.data(), 1, text.size(), stdout);
     std::fputc('\n', stdout);
-    std::fflush(stdout); // answers are read as they come, also through a pipe
+    std::fflush(stdout); // readers of a pipe see each answer at once
 }
 
 bool colours()

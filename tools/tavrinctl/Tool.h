@@ -11,35 +11,36 @@
 
 namespace tavrin::ctl {
 
-/// What ends a command: a text for the user, which says what to do next, and the exit status.
+/// Ends a command. Carries a message for the user, which says what to do next, and the exit status.
 class Failure : public std::runtime_error {
 public:
     explicit Failure(const std::string& message, int status_ = 1) : std::runtime_error(message), status(status_) {}
     int status;
 };
 
-/// The options that all commands take.
+/// The options of every command.
 struct Options {
     bool json = false;
     std::string address = TAVClient::defaultAddress();
     std::string identifier = "com.quorvane.tavrinctl";
     std::string agent = "tavrinctl/1";
     double timeout = 30;    ///< seconds
-    std::size_t limit = 10; ///< results of an answer that are listed; 0 is all
+    std::size_t limit = 10; ///< maximum number of results to list; 0 lists all
 };
 
-/// A connection to the daemon, or a `Failure`.
+/// Connects to the daemon. Throws `Failure` if no daemon answers.
 [[nodiscard]] std::unique_ptr<TAVClient> connect(const Options& options);
 
-/// A connection that has introduced itself.
+/// A connection that is configured with the client's identifier and agent.
 struct Session {
     std::unique_ptr<TAVClient> client;
     TAVSessionConfiguration configuration;
     std::string endpoint;
 };
+/// Throws `Failure` if there is no daemon or if it refuses the configuration.
 [[nodiscard]] Session openSession(const Options& options);
 
-/// The value of a call, or a `Failure` with its error.
+/// Returns the value of a call. Throws `Failure` with the reason if the call failed.
 template <class T> [[nodiscard]] T valueOf(platform::Result<T> result)
 {
     if (!result)
@@ -47,19 +48,19 @@ template <class T> [[nodiscard]] T valueOf(platform::Result<T> result)
     return std::move(*result);
 }
 
-/// A file of at most so many bytes, links followed; or a `Failure`.
+/// Reads a file of at most `maximumSize` bytes and follows links. Throws `Failure` if that fails.
 [[nodiscard]] std::string readFile(const std::string& path, std::size_t maximumSize);
 
-/// Writes a value as JSON with a line end.
+/// Prints a value as indented JSON.
 void printJson(const platform::Value& value);
-/// Writes a line to standard output.
+/// Prints a line to standard output and flushes it.
 void printLine(const std::string& text);
-/// Whether standard output is a terminal that takes colours; NO_COLOR says no.
+/// Returns true if standard output is a terminal and NO_COLOR is not set.
 [[nodiscard]] bool colours();
 [[nodiscard]] std::string bold(const std::string& text);
 [[nodiscard]] std::string dim(const std::string& text);
 
-/// A text from the service with its control characters replaced, so that it can't drive the terminal.
+/// Replaces control characters by blanks, so that a text from the service cannot control the terminal.
 [[nodiscard]] std::string printable(std::string_view text);
 
 } // namespace tavrin::ctl

@@ -13,19 +13,19 @@ int main(int argc, char** argv)
 
     Options options;
     Command chosen;
-    CLI::App app("Searches through the search daemon, and shows what the daemon has and does.");
+    CLI::App app("Sends searches to the daemon, and shows its state, its counters and its feedback.");
     app.set_version_flag("--version", "tavrinctl " TAVRIND_VERSION);
     app.fallthrough();
     app.require_subcommand(0, 1);
-    app.add_flag("--json", options.json, "Answer in JSON");
+    app.add_flag("--json", options.json, "Print JSON");
     app.add_option("--address", options.address, "The daemon's D-Bus address")->capture_default_str();
-    app.add_option("--identifier", options.identifier, "Client identifier to introduce oneself with")
+    app.add_option("--identifier", options.identifier, "Client identifier to connect as")->capture_default_str();
+    app.add_option("--agent", options.agent, "User agent, which selects this client's view of the bag")
         ->capture_default_str();
-    app.add_option("--agent", options.agent, "User agent; chooses the client's view of the bag")->capture_default_str();
     app.add_option("--timeout", options.timeout, "Seconds to wait for an answer")
         ->check(CLI::Range(0.001, 86400.0))
         ->capture_default_str();
-    app.add_option("-n,--limit", options.limit, "Results to list; 0 is all")->capture_default_str();
+    app.add_option("-n,--limit", options.limit, "Results to list; 0 lists all")->capture_default_str();
     addSearchCommand(app, chosen);
     addOtherRequestCommands(app, chosen);
     addImagesCommand(app, chosen);
