@@ -97,6 +97,18 @@ TEST_F(ServiceTest, ControlRefusesWhatItDoesNotKnowAndSaysWhatItDoes)
     EXPECT_EQ(get("/control/reset").status, 404) << "changes come by POST";
 }
 
+TEST_F(ServiceTest, NoFaultGivesABodyToAnAnswerThatMayHaveNone)
+{
+    Request call = request("GET", "/resources/TAVQIFeatures?version=1");
+    call.headers = {{"If-None-Match", "1"}};
+    for (const char* fault : {"cut", "notjson", "huge:10", "endless"}) {
+        ASSERT_TRUE(service.faults.add("resource", fault, 1));
+        const Answer answer = service.answer(call);
+        EXPECT_EQ(answer.status, 304);
+        EXPECT_TRUE(answer.body.empty() && answer.paddedTo == 0 && !answer.cut && !answer.goesOn) << fault;
+    }
+}
+
 TEST_F(ServiceTest, ControlIsForThisMachineOverHttp)
 {
     Request call = request("GET", "/control/status");

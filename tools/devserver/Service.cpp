@@ -92,6 +92,9 @@ Answer Service::answer(const Request& request)
                 return gate.wait(kPace, connection) == Gate::Outcome::TimeOver;
             };
     }
+    // HTTP allows these no body: a client would take its bytes for the next answer on the connection.
+    if (answer.status == 204 || answer.status == 304)
+        answer = {.status = answer.status, .headers = std::move(answer.headers)};
     if (isUpload) {
         const std::string line = uploads.add(std::move(upload), answer);
         if (onUpload) onUpload(line);
