@@ -244,6 +244,7 @@ TEST_F(ImageLoadingTest, AnAnswersImagesAreFetchedAhead)
         json(R"([{"url": "https://a.example/1", "id": "one"}, {"id": "two"}, {"url": "https://a.example/1"}])"));
     EXPECT_EQ(fetched(), (Strings{"https://a.example/1", "https://i.example/two", "https://i.example/one"}));
     EXPECT_EQ(fetches()[0]->originalRequest().timeout, platform::Duration(7s));
+    EXPECT_EQ(fetches()[0]->originalRequest().maximumResponseSize, 10u << 20);
     EXPECT_EQ(device.transactions.open().at("imageFetch"), 3);
     EXPECT_EQ(assembly().clientStateManager->validImageHosts(), (std::set<std::string>{"a.example", "i.example"}));
     EXPECT_TRUE(log.has(LogLevel::Default, "Tavrin_Images", "fetching image https://a.example/1"));

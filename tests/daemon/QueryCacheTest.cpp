@@ -1,7 +1,6 @@
 #include "tavrind/QueryCache.h"
 
 #include <algorithm>
-#include <random>
 
 #include "CoreTavrin/TAVFeedback.h"
 #include "CoreTavrin/TAVRequest.h"
@@ -9,7 +8,6 @@
 #include "platform/values/Dictionary.h"
 #include "platform/values/Json.h"
 #include "tavrind/TavrinUserGUIDController.h"
-#include "tests/support/CacheModel.h"
 #include "tests/support/DaemonFixture.h"
 
 namespace tavrin::test {
@@ -222,58 +220,6 @@ TEST_F(QueryCacheTest, ASetOutlivesTheCache)
     cache.reset();
     EXPECT_EQ(set->resultSet()["query"], Value("weather"));
     EXPECT_EQ(device.memoryPressure.watchers, 0);
-}
-
-TEST_F(QueryCacheTest, FollowsItsRulesThroughWhateverHappens)
-{
-    std::mt19937 random(11);
-    const auto upTo = [&](int limit) { return static_cast<int>(random() % static_cast<unsigned>(limit + 1)); };
-    const auto text = [&](int longest) {
-        std::string result;
-        for (int length = 1 + upTo(longest - 1); length > 0; --length) result += static_cast<char>('a' + upTo(2));
-        return result;
-    };
-    CacheModel model;
-    int hits = 0;
-    for (int i = 0; i < 20'000; ++i) {
-        const Date now = device.clock.wallNow();
-        switch (upTo(9)) {
-        case 0:
-            if (upTo(40) > 0) break;
-            model.clear();
-            cache->removeAllObjects();
-            device.drain();
-            break;
-        case 1: device.advance(std::chrono::seconds(upTo(20))); break;
-        case 2:
-        case 3:
-        case 4: {
-            const std::string query = text(6);
-            const std::string input = upTo(20) ? query.substr(0, 1 + upTo(5)) : query + "x";
-            const double scale = upTo(3);
-            const double score = upTo(2) ? upTo(3) + i * 1e-6 : -1 - i * 1e-6; // different for each
-            const int maxAge = upTo(1) ? upTo(60) : 0;
-            Dictionary set = sized(query, upTo(40) ? 200 : 200'000 + static_cast<std::size_t>(upTo(1'400'000)));
-            set.set("completion_score", score);
-            if (maxAge) set.set("max_age", maxAge);
-            model.put(input, scale, set, now);
-            put(input, std::move(set), scale);
-            break;
-        }
-        default: {
-            TAVSearchRequest request;
-            request.queryString = text(7);
-            request.scale = upTo(3);
-            const auto set = cache->getRequest(request);
-            const auto expected = model.get(request.queryString, request.scale, now);
-            ASSERT_EQ(set ? set->answer.view() : "", expected ? platform::toJson(Value::Array{expected->set}) : "")
-                << i << ": " << request.queryString << " " << request.scale;
-            hits += set ? 1 : 0;
-        }
-        }
-        ASSERT_EQ(cache->count(), model.entries.size()) << i;
-    }
-    EXPECT_GT(hits, 1000);
 }
 
 TEST_F(QueryCacheTest, ASearchIsAnsweredFromIt)

@@ -334,34 +334,6 @@ TEST_F(HttpCacheTest, DamageIsDroppedAndNeverAnswered)
     }
 }
 
-TEST_F(HttpCacheTest, AnIndexIsBegunAnewWhicheverPageIsDamaged)
-{
-    constexpr off_t kPage = 4096;
-    const fs::path index = directory / "http/index.db";
-    off_t page = 0;
-    while (true) {
-        SCOPED_TRACE(page);
-        open();
-        store(1, kSmall);
-        executor.drain();
-        cache.reset();
-        if (page * kPage >= static_cast<off_t>(fs::file_size(index))) break;
-        const FileHandle file(::open(index.c_str(), O_WRONLY));
-        ASSERT_EQ(pwrite(file.fd(), std::string(kPage, '!').data(), kPage, page * kPage), kPage);
-        open();
-        const std::string found = find(1);
-        EXPECT_TRUE(found == "(none)" || found == kSmall);
-        store(2, "goes on");
-        executor.drain();
-        open();
-        EXPECT_EQ(find(2), "goes on") << "after a restart, too";
-        cache.reset();
-        fs::remove_all(directory / "http");
-        ++page;
-    }
-    EXPECT_GE(page, 5) << "two tables, two indexes and the schema";
-}
-
 TEST_F(HttpCacheTest, SoManyMappingsAreKeptOnly)
 {
     open(0, 100u << 20);
