@@ -7,6 +7,7 @@
 #include <curl/curl.h>
 #include <fmt/format.h>
 
+#include "bench/CacheModel.h"
 #include "bench/Support.h"
 #include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVReply.h"
@@ -14,7 +15,6 @@
 #include "platform/files/Files.h"
 #include "platform/text/Text.h"
 #include "platform/values/Json.h"
-#include "tests/support/CacheModel.h"
 #include "tools/replay/Corpus.h"
 #include "tools/replay/Report.h"
 
