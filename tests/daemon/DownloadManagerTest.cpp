@@ -358,6 +358,7 @@ TEST_F(DownloadManagerTest, LookupHintsFollowTheBagTheirRedirectAndTheLocation)
 
 TEST_F(DownloadManagerTest, OnlyLookupHintsAreAskedForWithTheLocation)
 {
+    bag({});
     Dictionary all;
     for (const std::string_view identifier : kTAVResourceIdentifiers)
         all.set(std::string(identifier), "https://r.example/" + std::string(identifier));

@@ -172,6 +172,8 @@ TEST_F(UploadTest, CrowdsourcingRecordsGoOutOnTheirOwn)
 TEST_F(UploadTest, AnUploadOfAnEarlierProcessIsCountedAtItsEnd)
 {
     begin();
+    allUploads().front()->respond(200); // what the daemon said of its bag
+    device.drain();
     report("ZRCustomFeedback", {{"feedbackType", 2}, {"jsonFeedback", Dictionary()}});
     uploadOne();
     uploadOne();
@@ -457,6 +459,7 @@ TEST_F(UploadTest, BooksAcrossKills)
     device.drain();
     const std::int64_t underWay = booked(FeedbackFate::Uploading) + booked(FeedbackFate::Closed);
     device.files.files.erase("/caches/com.quorvane.tavrind/" + sessionFiles().at(0));
+    ASSERT_TRUE(device.files.removeDirectory("/state/transfers"));
     for (int i = 0; i < 2; ++i) {
         restart();
         EXPECT_EQ(booked(FeedbackFate::Unknown), underWay);

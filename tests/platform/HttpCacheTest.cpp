@@ -378,11 +378,11 @@ TEST_F(HttpCacheTest, OneDamagedBodyCostsNoOther)
     EXPECT_TRUE(std::ranges::any_of(lines, [](const auto& line) { return line.contains("damaged"); }));
 
     test::writeFile(directory / "http/99.body", "of nobody");
-    test::writeFile(directory / "http/new", "half-writ");
+    test::writeFile(directory / "http/7.body.1a2b3c4d.tmp", "half-writ");
     open();
     EXPECT_EQ(find(2), kLarge);
     EXPECT_FALSE(fs::exists(directory / "http/99.body"));
-    EXPECT_FALSE(fs::exists(directory / "http/new"));
+    EXPECT_FALSE(fs::exists(directory / "http/7.body.1a2b3c4d.tmp"));
 }
 
 TEST_F(HttpCacheTest, ADirectoryThatWasTakenAwayIsMadeAnew)

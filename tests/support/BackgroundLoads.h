@@ -1,6 +1,5 @@
 #pragma once
 
-#include <limits>
 #include <map>
 #include <memory>
 #include <string>
@@ -14,8 +13,8 @@
 
 namespace platform::test {
 
-/// Background sessions whose attempts a test answers by hand. All that may be under way at once are, so that a test
-/// sees each. The network is there and free of charge.
+/// Background sessions whose attempts a test answers by hand. Hundreds may be under way at once, so that a test sees
+/// each. The network is there and free of charge.
 class BackgroundLoads final : public BackgroundSessions {
 public:
     BackgroundLoads(MemoryFiles& files, ManualClock& clock, ManualExecutor& executor)
@@ -35,7 +34,7 @@ public:
     {
         configurations[configuration.identifier] = configuration;
         const std::string identifier = configuration.identifier;
-        configuration.parallelTransfers = std::numeric_limits<unsigned>::max();
+        configuration.parallelTransfers = 300; // each has a descriptor
         auto session = _sessions->make(std::move(configuration), std::move(delegate), std::move(delegateQueue));
         loads[identifier] = _loader.sessions.back();
         return session;
