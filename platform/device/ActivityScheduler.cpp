@@ -302,11 +302,11 @@ void Core::_load()
         return;
     }
     const auto contents = parseJson(bytes->view(), kMaximumFile);
-    const auto lived = contents ? (*contents)["lived"].asInt() : std::nullopt;
-    const auto wall = contents ? (*contents)["wall"].asInt() : std::nullopt;
-    if (!lived || !wall)
+    const std::string* text = contents ? (*contents)["time"].asString() : nullptr;
+    const auto mark = text ? LivedTime::Mark::parse(*text) : std::nullopt;
+    if (!mark)
         return defaultLog().error("due times of activities in {} are broken and forgotten", _environment.file.string());
-    _time = LivedTime(_environment.clock, LivedTime::Mark{Duration(*lived), Date(Duration(*wall))});
+    _time = LivedTime(_environment.clock, mark);
     if (const Dictionary* due = (*contents)["due"].asDictionary())
         for (const auto& [identifier, when] : *due)
             if (const auto span = when.asInt()) _kept[identifier] = Duration(*span);
@@ -320,8 +320,7 @@ void Core::_save()
     });
     Dictionary due;
     for (const auto& [identifier, when] : _kept) due.set(identifier, when.count());
-    const Dictionary contents{
-        {"lived", mark.lived.count()}, {"wall", mark.wall.time_since_epoch().count()}, {"due", std::move(due)}};
+    const Dictionary contents{{"time", mark.text()}, {"due", std::move(due)}};
     auto done = _environment.files.createDirectories(_environment.file.parent_path());
     if (done) done = _environment.files.writeAtomically(_environment.file, toJson(contents));
     if (!done) defaultLog().error("due times of activities can't be saved: {}", done.error().description());

@@ -31,7 +31,7 @@ constexpr std::array kSchema{
     " requestBody TEXT NOT NULL, bodySize INTEGER NOT NULL, note TEXT, resumed INTEGER NOT NULL,"
     " deadline INTEGER NOT NULL, failures INTEGER NOT NULL, notBefore INTEGER NOT NULL, outcome TEXT)",
     "CREATE TABLE hold (host TEXT PRIMARY KEY, until INTEGER NOT NULL)",
-    "CREATE TABLE time (one INTEGER PRIMARY KEY CHECK (one = 1), lived INTEGER NOT NULL, wall INTEGER NOT NULL)"};
+    "CREATE TABLE time (one INTEGER PRIMARY KEY CHECK (one = 1), mark TEXT NOT NULL)"};
 
 // ---- values ----
 
@@ -233,9 +233,8 @@ Result<void> BackgroundStore::load()
             _contents.holds.emplace(row.text(0), Duration(row.integer(1)));
         });
     if (read)
-        read = _database->run("SELECT lived, wall FROM time", {}, [&](const Sqlite::Row& row) {
-            _contents.time = {Duration(row.integer(0)), Date(Duration(row.integer(1)))};
-        });
+        read = _database->run("SELECT mark FROM time", {},
+                              [&](const Sqlite::Row& row) { _contents.time = LivedTime::Mark::parse(row.text(0)); });
     if (!read) return read;
     for (const std::uint64_t identifier : unreadable) {
         defaultLog().error("background task {} in {} is damaged and dropped", identifier, _directory.string());
@@ -290,8 +289,8 @@ Result<void> BackgroundStore::add(StoredTask& task, const FileHandle* body, std:
 
 Result<void> BackgroundStore::saveTime(const LivedTime::Mark& time)
 {
-    return _database->run("INSERT OR REPLACE INTO time VALUES (1, ?, ?)",
-                          {std::int64_t{time.lived.count()}, std::int64_t{time.wall.time_since_epoch().count()}});
+    const std::string mark = time.text();
+    return _database->run("INSERT OR REPLACE INTO time VALUES (1, ?)", {std::string_view(mark)});
 }
 
 Result<void> BackgroundStore::save(const StoredTask& task, const LivedTime::Mark& time)

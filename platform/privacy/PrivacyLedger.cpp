@@ -49,9 +49,7 @@ bool readDebits(const Value& value, std::vector<PrivacyLedger::Debit>& debits)
 /// A ledger with debits has a time, which is not before the last of them.
 bool readTime(const Value& value, PrivacyLedger& ledger)
 {
-    const auto lived = value["lived"].asInt();
-    const auto wall = value["wall"].asInt();
-    if (lived && wall) ledger.time = {Duration(*lived), Date(Duration(*wall))};
+    if (const std::string* text = value["time"].asString()) ledger.time = LivedTime::Mark::parse(*text);
     return ledger.debits.empty() || (ledger.time && ledger.debits.back().at <= secondsOf(ledger.time->lived));
 }
 
@@ -78,10 +76,7 @@ std::string PrivacyLedger::text() const
     Value::Array booked;
     for (const Debit& debit : debits) booked.push_back(Value::Array{debit.at, debit.reports});
     Dictionary ledger{{"secret", hexText(secret)}, {"debits", std::move(booked)}};
-    if (time) {
-        ledger.set("lived", time->lived.count());
-        ledger.set("wall", time->wall.time_since_epoch().count());
-    }
+    if (time) ledger.set("time", time->text());
     const std::string contents = toJson(ledger);
     return contents + "\n" + digestOf(contents) + "\n";
 }

@@ -2,6 +2,7 @@
 
 #include <cstdint>
 #include <functional>
+#include <string>
 
 #include "platform/base/Date.h"
 
@@ -19,6 +20,10 @@ public:
 
     [[nodiscard]] virtual Date wallNow() const = 0;
     [[nodiscard]] virtual std::uint64_t hostTicks() const = 0;
+    /// Nanoseconds since the device started, suspend included; no clock change moves it.
+    [[nodiscard]] virtual std::uint64_t bootTicks() const = 0;
+    /// Names that start of the device, unlike any other; empty if unknown.
+    [[nodiscard]] virtual std::string bootId() const = 0;
 
     /// Identifies a pending timer; never 0.
     using TimerId = std::uint64_t;

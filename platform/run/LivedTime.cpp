@@ -1,6 +1,10 @@
 #include "platform/run/LivedTime.h"
 
 #include <algorithm>
+#include <charconv>
+#include <limits>
+
+#include <fmt/format.h>
 
 #include "platform/run/Clock.h"
 
@@ -9,7 +13,7 @@ namespace platform {
 namespace {
 
 constexpr Duration kLongestAbsence = std::chrono::hours(24 * 366);
-/// Counts beyond are no counts of ours. Leaves room for every deadline.
+/// No count of ours is longer. Leaves room for every deadline.
 constexpr Duration kLongestLife = std::chrono::hours(24 * 366 * 100);
 
 /// The span between two dates, of which one may come from a damaged file.
@@ -21,29 +25,65 @@ Duration between(Date from, Date to)
     return Duration(span);
 }
 
-} // namespace
-
-Duration timePassed(Duration bySystemClock, Duration byHostTicks)
+Duration spanOf(std::uint64_t ticks)
 {
-    const bool plausible = bySystemClock >= byHostTicks && bySystemClock - byHostTicks <= kLongestAbsence;
-    return plausible ? bySystemClock : byHostTicks;
+    constexpr auto kMost = static_cast<std::uint64_t>(std::numeric_limits<Duration::rep>::max());
+    return Duration(static_cast<Duration::rep>(std::min(ticks, kMost)));
 }
 
-LivedTime::LivedTime(Clock& clock, std::optional<Mark> saved)
-    : _clock(&clock), _mark{Duration::zero(), clock.wallNow()}, _ticks(clock.hostTicks())
+ClockReading readingOf(const Clock& clock)
+{
+    return {.wall = clock.wallNow(), .bootTicks = clock.bootTicks(), .boot = clock.bootId()};
+}
+
+} // namespace
+
+Duration timePassed(const ClockReading& from, const ClockReading& to)
+{
+    if (from.boot == to.boot && !to.boot.empty())
+        return to.bootTicks > from.bootTicks ? spanOf(to.bootTicks - from.bootTicks) : Duration::zero();
+    const Duration sinceRestart = spanOf(to.bootTicks);
+    const Duration bySystemClock = between(from.wall, to.wall);
+    const bool plausible = bySystemClock >= sinceRestart && bySystemClock - sinceRestart <= kLongestAbsence;
+    return plausible ? bySystemClock : sinceRestart;
+}
+
+std::string LivedTime::Mark::text() const
+{
+    return fmt::format("{} {} {} {}", lived.count(), clock.wall.time_since_epoch().count(), clock.bootTicks,
+                       clock.boot);
+}
+
+std::optional<LivedTime::Mark> LivedTime::Mark::parse(std::string_view text)
+{
+    const auto take = [&text](auto& number) {
+        const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);
+        if (error != std::errc() || end == text.data() + text.size() || *end != ' ') return false;
+        text.remove_prefix(static_cast<std::size_t>(end - text.data()) + 1);
+        return true;
+    };
+    std::int64_t lived = 0;
+    std::int64_t wall = 0;
+    Mark mark;
+    if (!take(lived) || !take(wall) || !take(mark.clock.bootTicks)) return std::nullopt;
+    mark.lived = Duration(lived);
+    mark.clock.wall = Date(Duration(wall));
+    mark.clock.boot = text;
+    return mark;
+}
+
+LivedTime::LivedTime(Clock& clock, std::optional<Mark> saved) : _clock(&clock), _mark{{}, readingOf(clock)}
 {
     if (!saved) return;
     const Duration lived = std::clamp(saved->lived, Duration::zero(), kLongestLife);
-    _mark.lived = lived + timePassed(between(saved->wall, _mark.wall), Duration::zero());
+    _mark.lived = lived + std::min(timePassed(saved->clock, _mark.clock), kLongestLife);
 }
 
 Duration LivedTime::now()
 {
-    const Date wall = _clock->wallNow();
-    const std::uint64_t ticks = _clock->hostTicks();
-    _mark.lived += timePassed(between(_mark.wall, wall), Duration(ticks - _ticks));
-    _mark.wall = wall;
-    _ticks = ticks;
+    ClockReading reading = readingOf(*_clock);
+    _mark.lived += timePassed(_mark.clock, reading);
+    _mark.clock = std::move(reading);
     return _mark.lived;
 }
 

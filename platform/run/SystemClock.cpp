@@ -2,6 +2,7 @@
 
 #include <cerrno>
 #include <ctime>
+#include <fstream>
 #include <map>
 #include <mutex>
 #include <sys/epoll.h>
@@ -31,12 +32,9 @@ public:
         return dateFromSystemTime(now.tv_sec, now.tv_nsec);
     }
 
-    std::uint64_t hostTicks() const override
-    {
-        timespec now{};
-        clock_gettime(CLOCK_MONOTONIC, &now);
-        return static_cast<std::uint64_t>(now.tv_sec) * 1'000'000'000 + static_cast<std::uint64_t>(now.tv_nsec);
-    }
+    std::uint64_t hostTicks() const override { return ticksOf(CLOCK_MONOTONIC); }
+    std::uint64_t bootTicks() const override { return ticksOf(CLOCK_BOOTTIME); }
+    std::string bootId() const override { return _bootId; }
 
     TimerId after(Duration delay, std::move_only_function<void()> fire) override
     {
@@ -65,6 +63,20 @@ public:
     }
 
 private:
+    static std::uint64_t ticksOf(clockid_t clock)
+    {
+        timespec now{};
+        clock_gettime(clock, &now);
+        return static_cast<std::uint64_t>(now.tv_sec) * 1'000'000'000 + static_cast<std::uint64_t>(now.tv_nsec);
+    }
+    static std::string readBootId()
+    {
+        std::string id;
+        std::ifstream("/proc/sys/kernel/random/boot_id") >> id;
+        return id;
+    }
+
+    const std::string _bootId = readBootId();
     struct Key {
         std::uint64_t due;
         TimerId id;

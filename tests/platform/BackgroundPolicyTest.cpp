@@ -71,35 +71,53 @@ TEST(BackgroundPolicy, RetryAfterIsSecondsOrADate)
 
 TEST(LivedTime, CountsAbsenceAndSuspendButNoLeaps)
 {
+    const Date then = dateFromSecondsSince1970(1767225600);
     const struct {
-        Duration system, ticks, passed;
+        const char* name;
+        Duration wall, bootTicks; ///< at the second reading; at the first the ticks are an hour
+        const char* boot;         ///< at the second reading; at the first "a"
+        Duration passed;
     } cases[]{
-        {5s, 5s, 5s},
-        {8h, 5s, 8h},
-        {4s, 5s, 5s},
-        {-10h, 5s, 5s},
-        {0s, 0s, 0s},
-        {24h * 300, 0s, 24h * 300},
-        {24h * 400, 5s, 5s},
-        {Duration::max(), 5s, 5s},
-        {Duration::min(), 0s, 0s},
+        {"nothing", 0s, 1h, "a", 0s},
+        {"running, or suspended", 5s, 1h + 5s, "a", 5s},
+        {"clock set ahead", 8 * 24h, 1h + 5s, "a", 5s},
+        {"clock set back", -10h, 1h + 5s, "a", 5s},
+        {"ticks of a damaged file", 5s, 0s, "a", 0s},
+        {"off for a day", 24h, 10s, "b", 24h},
+        {"off for a moment", 10s, 10s, "b", 10s},
+        {"off, and the clock set back", -1h, 10s, "b", 10s},
+        {"off for ten months", 24h * 300, 0s, "b", 24h * 300},
+        {"off, and the clock set far ahead", 24h * 400, 5s, "b", 5s},
+        {"off, and a date beyond all", Duration::max(), 5s, "b", 5s},
+        {"unknown starts", 24h, 10s, "", 24h},
     };
-    for (const auto& c : cases) EXPECT_EQ(timePassed(c.system, c.ticks), c.passed) << c.system.count();
+    for (const auto& c : cases) {
+        const Date wall = c.wall == Duration::max() ? Date::max() : then + c.wall;
+        const std::string boot = *c.boot ? "a" : "";
+        EXPECT_EQ(timePassed({then, static_cast<std::uint64_t>(Duration(1h).count()), boot},
+                             {wall, static_cast<std::uint64_t>(c.bootTicks.count()), c.boot}),
+                  c.passed)
+            << c.name;
+    }
 }
 
-TEST(LivedTime, AMarkFromADamagedFileStillCounts)
+TEST(LivedTime, AMarkReadsBackAndOneFromADamagedFileStillCounts)
 {
     test::ManualClock clock;
-    for (const LivedTime::Mark& mark : {LivedTime::Mark{Duration::max(), Date::max()},
-                                        {Duration::min(), Date::min()},
-                                        {Duration(-1), Date()},
-                                        {1h, clock.wallNow() + 1000h}}) {
-        LivedTime time(clock, mark);
+    LivedTime running(clock);
+    clock.suspend(1h);
+    const LivedTime::Mark mark = running.mark();
+    EXPECT_EQ(mark.lived, 1h);
+    EXPECT_EQ(LivedTime::Mark::parse(mark.text()), mark);
+    for (const char* broken : {"", "1", "1 2", "1 2 3", "x 2 3 b", "1 2 -3 b"})
+        EXPECT_FALSE(LivedTime::Mark::parse(broken)) << broken;
+    for (const char* text : {"9223372036854775807 9223372036854775807 18446744073709551615 boot 1",
+                             "-9223372036854775808 -9223372036854775808 0 boot 1", "-1 0 0 ", "3600 0 0 other"}) {
+        LivedTime time(clock, LivedTime::Mark::parse(text).value());
         const Duration before = time.now();
-        EXPECT_GE(before, 0s);
+        EXPECT_GE(before, 0s) << text;
         clock.advance(1min, [] {});
-        EXPECT_EQ(time.now() - before, 1min);
-        EXPECT_EQ(time.mark().wall, clock.wallNow());
+        EXPECT_EQ(time.now() - before, 1min) << text;
     }
 }
 

@@ -510,18 +510,30 @@ TEST_F(BackgroundSessionTest, WhatCantGetBetterEndsATask)
 
 TEST_F(BackgroundSessionTest, TheTimeOutGoesOnWithoutTheProcessAndLeapsOfTheClockDontCount)
 {
+    const auto sleep = &test::ManualClock::suspend;
+    const auto off = &test::ManualClock::restartDevice;
+    const auto leap = [](test::ManualClock& clock, Duration by) { clock.setWall(clock.wallNow() + by); };
     const struct {
+        std::function<void(test::ManualClock&, Duration)> happens;
         Duration absence;
         bool endsAtOnce;
-    } cases[]{{6h, false},        {8 * 24h, true},         {-400 * 24h, false},
-              {400 * 24h, false}, {24h * 365 * 50, false}, {-24h * 365 * 50, false}};
+    } cases[]{{sleep, 6h, false},
+              {sleep, 8 * 24h, true},
+              {off, 6h, false},
+              {off, 8 * 24h, true},
+              {off, 400 * 24h, false},
+              {off, -400 * 24h, false},
+              {leap, 8 * 24h, false},
+              {leap, -400 * 24h, false},
+              {leap, 24h * 365 * 50, false},
+              {leap, -24h * 365 * 50, false}};
     for (const auto& c : cases) {
         fs::remove_all(store());
         test::ManualClock clock;
         {
             (void)Process(root.path, {.identifier = "uploads"}, &clock).resumed("x");
         }
-        clock.setWall(clock.wallNow() + c.absence);
+        c.happens(clock, c.absence);
         Process next(root.path, {.identifier = "uploads"}, &clock);
         EXPECT_EQ(next.attempts().size(), c.endsAtOnce ? 0u : 1u) << toSeconds(c.absence);
         // And while it runs: neither lost nor stuck.

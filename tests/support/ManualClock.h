@@ -20,6 +20,16 @@ public:
         std::lock_guard lock(_mutex);
         return _ticks;
     }
+    [[nodiscard]] std::uint64_t bootTicks() const override
+    {
+        std::lock_guard lock(_mutex);
+        return _ticks + _suspended - _started;
+    }
+    [[nodiscard]] std::string bootId() const override
+    {
+        std::lock_guard lock(_mutex);
+        return "boot " + std::to_string(_boots);
+    }
     TimerId after(Duration delay, std::move_only_function<void()> fire) override
     {
         std::lock_guard lock(_mutex);
@@ -51,6 +61,21 @@ public:
         std::lock_guard lock(_mutex);
         _wall = wall;
     }
+    /// The device sleeps, or runs without the process under test: timers don't notice either.
+    void suspend(Duration time)
+    {
+        std::lock_guard lock(_mutex);
+        _wall += time;
+        _suspended += static_cast<std::uint64_t>(time.count());
+    }
+    /// The device is switched off for a time, and starts again.
+    void restartDevice(Duration off)
+    {
+        std::lock_guard lock(_mutex);
+        _wall += off;
+        _started = _ticks + _suspended;
+        ++_boots;
+    }
     [[nodiscard]] std::size_t pendingTimers() const
     {
         std::lock_guard lock(_mutex);
@@ -78,6 +103,9 @@ private:
     mutable std::mutex _mutex;
     Date _wall = dateFromSecondsSince1970(1767225600);
     std::uint64_t _ticks = 3'600'000'000'000;
+    std::uint64_t _suspended = 0;
+    std::uint64_t _started = 0; // of `_ticks + _suspended`, when the device started
+    int _boots = 1;
     std::map<std::pair<std::uint64_t, TimerId>, std::move_only_function<void()>> _timers;
     TimerId _lastId = 0;
 };
