@@ -96,14 +96,14 @@ void DownloadManager::setLookupResources(std::weak_ptr<LookupResources> lookupRe
 
 std::optional<DownloadResource> DownloadManager::resourceForKey(const std::string& identifier) const
 {
-    const std::shared_ptr<const Published> published = _published;
+    const auto published = _lastPublished();
     const auto found = published->resources.find(identifier);
     return found == published->resources.end() ? std::nullopt : std::optional(found->second);
 }
 
 platform::Dictionary DownloadManager::resourceVersions() const
 {
-    return _published.load()->versions;
+    return _lastPublished()->versions;
 }
 
 platform::Result<DownloadManager::Resource> DownloadManager::fileHandleForResource(const std::string& identifier) const
@@ -172,7 +172,15 @@ void DownloadManager::_publish()
     for (const auto& [identifier, resource] : _resources)
         if (std::string version = _resourceVersion(resource); !version.empty())
             versions.set(identifier, std::move(version));
-    _published = std::make_shared<const Published>(_resources, std::move(versions));
+    auto published = std::make_shared<const Published>(_resources, std::move(versions));
+    const std::lock_guard lock(_publishedMutex);
+    _published.swap(published);
+}
+
+std::shared_ptr<const DownloadManager::Published> DownloadManager::_lastPublished() const
+{
+    const std::lock_guard lock(_publishedMutex);
+    return _published;
 }
 
 void DownloadManager::_downloadBagResources(const std::shared_ptr<const TAVBag>& bag)

@@ -1,6 +1,5 @@
 #pragma once
 
-#include <atomic>
 #include <cstdint>
 #include <filesystem>
 #include <map>
@@ -100,6 +99,7 @@ private:
     void _loadResources();
     void _saveResources();
     void _publish();
+    [[nodiscard]] std::shared_ptr<const Published> _lastPublished() const;
     void _downloadBagResources(const std::shared_ptr<const TAVBag>& bag);
     void _replaceDownloads(const std::vector<std::shared_ptr<platform::BackgroundTask>>& tasks, const TAVBag& bag);
     void _addResource(const std::string& identifier, const std::optional<platform::Url>& url);
@@ -123,8 +123,9 @@ private:
     std::map<std::string, Pending> _pending; // by identifier
     std::uint64_t _lastTimer = 0;
     std::weak_ptr<LookupResources> _lookupResources;
-    std::atomic<std::shared_ptr<const Published>> _published; // any thread
-    std::once_flag _started;                                  // any thread
+    mutable std::mutex _publishedMutex;
+    std::shared_ptr<const Published> _published; // under the mutex, any thread
+    std::once_flag _started;                     // any thread
     platform::NotificationCenter::Token _bagObserver;
     platform::NotificationCenter::Token _locationObserver;
 };
