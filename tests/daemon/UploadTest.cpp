@@ -1,3 +1,5 @@
+#include <algorithm>
+
 #include <openssl/evp.h>
 
 #include "platform/values/Dictionary.h"
