@@ -16,6 +16,7 @@
 #include "tavrind/FileContainer.h"
 #include "tavrind/Startup.h"
 #include "tavrind/TavrinFeedback.h"
+#include "tavrind/TavrinFeedbackFlusher.h"
 #include "tavrind/TavrinPersistentStorage.h"
 #include "tavrind/TavrinSessionFeedback.h"
 #include "tests/support/TestDevice.h"

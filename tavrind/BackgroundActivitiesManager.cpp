@@ -27,7 +27,7 @@ constexpr const char* kActivity = "com.quorvane.tavrind.flusher.background";
 constexpr std::chrono::seconds kDelay = 300s;
 constexpr std::chrono::seconds kInterval = 600s;
 constexpr std::chrono::seconds kGracePeriod = 300s;
-/// No body takes so long to make.
+/// No body takes that long to write.
 constexpr std::chrono::hours kOldBody(1);
 
 const platform::Log& log()
@@ -46,7 +46,7 @@ platform::ActivityCriteria criteria()
     return criteria;
 }
 
-/// Moves the activity on, or logs that it may not.
+/// Sets the activity's state; a refusal is logged.
 void setState(ActivityState state, platform::Activity& activity)
 {
     const ActivityState current = TavrinXPCActivity::getStateForActivity(activity);
@@ -83,7 +83,7 @@ BackgroundActivitiesManager::~BackgroundActivitiesManager()
 void BackgroundActivitiesManager::_runActivity(const std::shared_ptr<platform::Activity>& activity)
 {
     if (TavrinXPCActivity::getStateForActivity(*activity) != ActivityState::Run)
-        return; // it checks in with the criteria that it was registered with
+        return; // a check-in keeps the criteria of the registration
     if (_stopFlushing) {
         log().log("flushing has been stopped, will start again with dump command");
         setState(ActivityState::Done, *activity);
@@ -115,6 +115,8 @@ void BackgroundActivitiesManager::_flusherActivity()
         _assembly.persistentStorage->deleteSessionWithFileContainer(container);
         _assembly.feedbackBooks.move(FeedbackFate::Closed, fate, lost);
         if (!session) continue;
+        // A process that is killed from here on loses this session; it never sends it twice.
+        _assembly.persistentStorage->syncDeletions();
         // The events are in memory again, until they are in an upload.
         _assembly.feedbackBooks.move(FeedbackFate::Closed, FeedbackFate::Open, session->recordedEvents());
         _feedbackFlusher->flushSyncFromArray({session});
@@ -124,8 +126,8 @@ void BackgroundActivitiesManager::_flusherActivity()
     _assembly.feedbackBooks.save();
 }
 
-/// Removes the files of processes that were killed while they made an upload's body: there are users' events in them. A
-/// young file may be one that is being made.
+/// Removes the bodies of processes that were killed while they wrote them: they hold users' events. A young file may be
+/// one that is being written.
 void BackgroundActivitiesManager::_sweepBodies()
 {
     const std::filesystem::path& directory = _assembly.device.directories.temporary;
@@ -176,25 +178,26 @@ void BackgroundActivitiesManager::taskDidComplete(const std::shared_ptr<platform
 {
     log().log("URLSession:task:didCompleteWithError: id={}, error={}", task->identifier(),
               error ? error->description() : "none");
+    const UploadNote note = UploadNote::from(task->note());
+    const std::string upload = note.process + '/' + std::to_string(task->identifier());
+    if (_assembly.feedbackBooks.isSettled(upload)) return;
     if (error && error->domain == platform::kUrlErrorDomain && error->code == platform::kUrlTimedOut)
         _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.fbrequesttimedout");
 
+    const bool sent = response && response->statusCode == 200;
     _findUpload(*task);
     const std::int64_t count = _feedbackFlusher->getFeedbackCountForTask(*task);
     _feedbackFlusher->removeFeedbacksForTask(*task);
     _assembly.crowdsourcingFeedbackFlusher->removeFeedbacksForTask(*task);
-    const bool sent = response && response->statusCode == 200;
     if (sent) {
         _assembly.diagnosticData.addValue(count, "com.quorvane.tavrind.feedbacksent");
     } else {
         log().fault("response error {}", response ? std::to_string(response->statusCode) : "none");
         _assembly.diagnosticData.addValue(count, "com.quorvane.tavrind.feedbacknotsent");
     }
-    _assembly.feedbackBooks.move(FeedbackFate::Uploading, sent ? FeedbackFate::Sent : FeedbackFate::NotSent,
-                                 UploadNote::from(task->note()).events);
     // The session forgets the task once this returns: from then on a kill must not lose what it counted.
-    _assembly.feedbackBooks.save();
     _assembly.device.counters.synchronize();
+    _assembly.feedbackBooks.settle(upload, sent ? FeedbackFate::Sent : FeedbackFate::NotSent, note.events);
 }
 
 void BackgroundActivitiesManager::sessionDidFinishEvents()

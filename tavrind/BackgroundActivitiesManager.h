@@ -18,10 +18,10 @@ namespace tavrin {
 struct Assembly;
 class TavrinFeedbackFlusher;
 
-/// Uploads what waits in closed session files: every ten minutes as a background activity, or on demand. It is told by
-/// the upload session what became of the uploads.
+/// Uploads the closed session files, every ten minutes as a background activity or on demand, and books the outcomes
+/// that the upload session reports.
 ///
-/// A pass reads each file, deletes it, whether it could be read or not, and hands its session to the flusher: a file is
+/// A pass reads each file, deletes it whether it could be read or not, and hands its session to the flusher: a file is
 /// never read twice. Passes run one at a time. Any thread.
 class BackgroundActivitiesManager : public platform::BackgroundSessionDelegate,
                                     public std::enable_shared_from_this<BackgroundActivitiesManager> {
@@ -31,15 +31,15 @@ public:
     explicit BackgroundActivitiesManager(Assembly& assembly);
     ~BackgroundActivitiesManager() override;
 
-    /// Runs one pass, soon, then calls back.
+    /// Runs one pass, asynchronously, then calls back.
     void insertFlushActivity(std::move_only_function<void()> callback);
-    /// While stopped, the background activity does nothing; passes on demand still run.
+    /// While this is set the background activity does nothing; passes on demand still run.
     [[nodiscard]] bool stopFlushing() const { return _stopFlushing; }
     void setStopFlushing(bool stop) { _stopFlushing = stop; }
 
     [[nodiscard]] const std::shared_ptr<TavrinFeedbackFlusher>& feedbackFlusher() const { return _feedbackFlusher; }
-    /// Books the uploads that an earlier process left under way, and removes the unfinished bodies that it left; once
-    /// the upload session is there.
+    /// Books the unfinished uploads of an earlier process, and removes the bodies that it left half made. Call it once
+    /// the upload session exists.
     void findUploads();
 
     void taskDidSendBodyData(const std::shared_ptr<platform::BackgroundTask>& task, std::uint64_t sent,

@@ -255,7 +255,7 @@ void ClientConnection::reportEvent(std::shared_ptr<ZRFeedback> feedback, std::in
 {
     const platform::Log& log = TavrinLogForCategory(kLogFeedback);
     if (!_state) {
-        _reportOneOff(makeTAVError(TAVErrorInvalidResponse, "client state nil"));
+        if (!_reportedNoState.exchange(true)) _reportOneOff(makeTAVError(TAVErrorInvalidResponse, "client state nil"));
         return log.error("state must not be nil");
     }
     if (auto custom = std::dynamic_pointer_cast<ZRCustomFeedback>(feedback)) {

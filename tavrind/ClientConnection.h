@@ -74,6 +74,7 @@ private:
     std::shared_ptr<ClientState> _state;
     std::mutex _orderMutex; // so that no query is accepted between an answer's check and its delivery
     std::atomic<std::int64_t> _currentQueryId = 0;
+    std::atomic<bool> _reportedNoState = false; ///< one error session for a connection
     platform::NotificationCenter::Token _bagObserver;
 };
 

@@ -59,6 +59,15 @@ std::optional<std::string_view> dailyActiveClient(std::string_view firstUseKey)
 
 ClientSession::ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback> feedback,
                              std::int64_t previousSessionEndReason, std::shared_ptr<void> call)
+    : ClientSession(assembly, std::move(feedback), previousSessionEndReason, std::move(call), FileUse::Session)
+{}
+
+ClientSession::ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback> feedback)
+    : ClientSession(assembly, std::move(feedback), 0, nullptr, FileUse::OneOff)
+{}
+
+ClientSession::ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback> feedback,
+                             std::int64_t previousSessionEndReason, std::shared_ptr<void> call, FileUse use)
     : _assembly(assembly), _sessionQueue(assembly.device.serialQueue("com.quorvane.tavrind.clientSessionQueue")),
       _sessionFeedbacks(std::make_shared<Feedbacks>())
 {
@@ -72,7 +81,7 @@ ClientSession::ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback>
     assembly.diagnosticData.addValue(1, createCounterKey(_header.agent, "sessions"));
     _header.firstUse = assembly.dateQueue->sync([this] { return _firstUseOfTheDay(); });
     if (assembly.downloadManager) _header.resourceVersions = assembly.downloadManager->resourceVersions();
-    if (assembly.persistentStorage) _storageHandle = assembly.persistentStorage->createFileContainerForWriting();
+    if (assembly.persistentStorage) _storageHandle = assembly.persistentStorage->createFileContainerForWriting(use);
     if (_storageHandle) _storageHandle->writeSessionHeader(_header);
     if (feedback) addFeedback(std::move(feedback), std::move(call));
 }

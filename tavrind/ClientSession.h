@@ -21,6 +21,7 @@ struct Assembly;
 struct TavrinFeedback;
 class ClientSession;
 class FileContainer;
+enum class FileUse;
 
 /// The current session of a manager: one session, or one for each user agent. Any thread.
 class Session {
@@ -44,8 +45,10 @@ public:
 class ClientSession final : public Session {
 public:
     /// Begins a session with `feedback`, whose agent and GUID become the session's, and creates its file.
-    ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback> feedback,
-                  std::int64_t previousSessionEndReason = 0, std::shared_ptr<void> call = {});
+    ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback> feedback, std::int64_t previousSessionEndReason,
+                  std::shared_ptr<void> call = {});
+    /// A one-off session: its only record is `feedback`, and the caller completes it.
+    ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback> feedback);
     ~ClientSession() override;
 
     void addFeedback(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call = {}) override;
@@ -62,11 +65,13 @@ public:
     [[nodiscard]] const ClientSessionHeader& header() const { return _header; }
     [[nodiscard]] const std::string& agent() const { return _header.agent; }
 
-    /// Creates a session whose only record is an error of the daemon; the caller completes it.
+    /// Creates a one-off session with an error of the daemon.
     [[nodiscard]] static std::shared_ptr<ClientSession> createFeedbackSessionFromError(const platform::Error& error,
                                                                                        Assembly& assembly);
 
 private:
+    ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback> feedback, std::int64_t previousSessionEndReason,
+                  std::shared_ptr<void> call, FileUse use);
     void _write(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call);
     // On the assembly's dateQueue.
     [[nodiscard]] bool _firstUseOfTheDay();

@@ -21,6 +21,8 @@ using platform::Value;
 namespace {
 
 constexpr std::size_t kMaximumFileSize = 64 * 1024;
+/// Uploads that `isSettled` remembers: the upload session forgets an outcome a moment after it is booked.
+constexpr std::size_t kMaximumSettled = 100;
 
 /// By fate. From kFirstDropped on they are reasons of a drop.
 constexpr std::array<std::string_view, kFeedbackFates> kNames{
@@ -66,6 +68,9 @@ void FeedbackBooks::_load()
     for (const FeedbackFate underWay : {FeedbackFate::Open, FeedbackFate::Closed, FeedbackFate::Uploading})
         _unresolved += std::exchange(_counts[at(underWay)], 0);
     _counts[at(FeedbackFate::Unknown)] += _unresolved;
+    if (const auto* settled = (*books)["settled"].asArray())
+        for (const Value& upload : *settled)
+            if (upload.asString()) _settled.push_back(*upload.asString());
 }
 
 void FeedbackBooks::record(FeedbackFate fate, std::uint64_t events)
@@ -93,10 +98,33 @@ void FeedbackBooks::find(FeedbackFate fate, std::uint64_t events)
     _counts[at(fate)] += found;
 }
 
+void FeedbackBooks::settle(const std::string& upload, FeedbackFate outcome, std::uint64_t events)
+{
+    {
+        const std::lock_guard lock(_mutex);
+        _settled.push_back(upload);
+        if (_settled.size() > kMaximumSettled) _settled.pop_front();
+        _counts[at(FeedbackFate::Uploading)] -= static_cast<std::int64_t>(events);
+        _counts[at(outcome)] += static_cast<std::int64_t>(events);
+    }
+    save();
+}
+
+bool FeedbackBooks::isSettled(const std::string& upload) const
+{
+    const std::lock_guard lock(_mutex);
+    return std::ranges::find(_settled, upload) != _settled.end();
+}
+
 void FeedbackBooks::save()
 {
     const std::lock_guard saving(_saving);
-    const std::string text = platform::toJson(description());
+    Value books = description();
+    {
+        const std::lock_guard lock(_mutex);
+        books.mutableDictionary().set("settled", Value::Array(_settled.begin(), _settled.end()));
+    }
+    const std::string text = platform::toJson(books);
     auto written = _files.createDirectories(_path.parent_path());
     if (written) written = _files.writeAtomically(_path, text);
     if (!written) TavrinLogForCategory(kLogFeedback).error("feedback books not saved: {}", written.error().reason());

@@ -2,6 +2,7 @@
 
 #include <array>
 #include <cstdint>
+#include <deque>
 #include <filesystem>
 #include <memory>
 #include <mutex>
@@ -18,62 +19,66 @@ namespace tavrin {
 
 /// Where a recorded event is now, or what became of it.
 enum class FeedbackFate : std::uint8_t {
-    Open,      ///< in a session that goes on, or about to be sent on its own
+    Open,      ///< in an open session, or waiting to be sent on its own
     Closed,    ///< in a closed session file
     Uploading, ///< in an upload that has not ended
-    Sent,      ///< the service has it
-    NotSent,   ///< its upload failed
-    Unknown,   ///< it was somewhere when an earlier process ended, and wasn't found again
-    // Dropped, because
-    FeedbackOff,   ///< the bag doesn't want feedback
+    Sent,      ///< accepted by the service
+    NotSent,   ///< in an upload that failed
+    Unknown,   ///< under way when an earlier process ended, and not found again
+    // The rest are reasons of a drop.
+    FeedbackOff,   ///< the bag switches feedback off
     NoContainer,   ///< the session has no file
-    RefusedAppend, ///< it did not fit into the session's file, or could not be written there
-    FileTooBig,    ///< the session's file was larger than may be read
+    RefusedAppend, ///< it did not fit into the session's file or could not be written
+    FileTooBig,    ///< the session's file was too large to be read
     TooOld,        ///< the session's file was too old
     Unreadable,    ///< the session's file could not be read
     OtherVersion,  ///< another version of the daemon wrote the session's file
-    DamagedTail,   ///< it stood behind a damaged record
-    NotJson,       ///< it can't be written as JSON
+    DamagedTail,   ///< it was after a damaged record
+    NotJson,       ///< it could not be written as JSON
     NoBody,        ///< the upload's body could not be written
-    NoTask,        ///< the upload could not be made
-    EndpointUnset, ///< there was nowhere to send it to
-    BufferFull,    ///< too many waited to be sent already
+    NoTask,        ///< the upload could not be created
+    EndpointUnset, ///< there was no endpoint
+    BufferFull,    ///< too many were waiting to be sent
 };
 inline constexpr std::size_t kFeedbackFates = static_cast<std::size_t>(FeedbackFate::BufferFull) + 1;
 
-/// The books of the feedback pipeline, in events: every event that was recorded is in exactly one place, so that
-/// `recorded` is at all times the sum over all fates.
+/// The books of the feedback pipeline, counted in events. Every recorded event is in exactly one place: `recorded` is
+/// always the sum over all fates.
 ///
-/// They outlive the process. They are saved where events change hands between files (a session is closed, read,
-/// uploaded), not with every event. A new process takes all that was under way for unknown, and moves to their places
-/// the events that it finds again in session files and unfinished uploads; what it finds beyond the books, written
-/// after they were last saved, it books as recorded. It can't tell one event from another: one that was written since
-/// then takes the place of one that is gone, and an upload that is reported again after a kill is booked again. Any
-/// thread.
+/// The books outlive the process. They are saved when events move between files (a session is closed, read, uploaded),
+/// not with every event. A new process counts all events under way as unknown, then moves those that it finds in
+/// session files and unfinished uploads to their places. Events that it finds beyond those, written after the last
+/// save, count as recorded. Events are not told apart: one written since the last save takes the place of one that is
+/// gone. Any thread.
 class FeedbackBooks {
 public:
-    /// Reads `path`; a damaged file is logged, and the books begin anew.
-    /// `queue` (serial) runs the saving.
+    /// Reads `path`; a damaged file is logged and replaced. `queue` (serial) runs `saveSoon`.
     FeedbackBooks(platform::FileSystem& files, std::filesystem::path path, std::shared_ptr<platform::Queue> queue);
 
-    /// An event was recorded, and is at, or dropped for, `fate`.
+    /// Books new events, which are at `fate` or dropped because of it.
     void record(FeedbackFate fate, std::uint64_t events = 1);
-    /// Events went on.
+    /// Moves events from one place to another.
     void move(FeedbackFate from, FeedbackFate to, std::uint64_t events);
-    /// Events of an earlier process were found.
+    /// Books events of an earlier process that were found again.
     void find(FeedbackFate fate, std::uint64_t events);
-    /// Writes them out; a failure is logged, and the books go on in memory.
+    /// Moves the events of an upload from `Uploading` to `outcome`, and saves the books before it returns. `upload`
+    /// names the upload among those of all processes.
+    void settle(const std::string& upload, FeedbackFate outcome, std::uint64_t events);
+    /// Returns whether an upload was settled lately. The outcome of one that is reported again, because the process was
+    /// killed before the upload session forgot it, must not be booked again.
+    [[nodiscard]] bool isSettled(const std::string& upload) const;
+    /// Writes the books to disk. A failure is logged, and the books go on in memory.
     void save();
-    /// The same, soon, and once for calls that come close together.
+    /// Saves asynchronously, once for calls that come close together.
     void saveSoon();
 
-    /// Names this process's part of the books, unlike that of any other.
+    /// Identifies this process among all that keep these books.
     [[nodiscard]] const std::string& process() const { return _process; }
 
     [[nodiscard]] std::int64_t recorded() const;
     [[nodiscard]] std::int64_t count(FeedbackFate fate) const;
-    /// {"recorded", "open", "closed", "uploading", "sent", "notSent", "unknown", "dropped": {reason: events}}; every
-    /// reason is there.
+    /// {"recorded", "open", "closed", "uploading", "sent", "notSent", "unknown", "dropped": {reason: events}} with
+    /// every reason.
     [[nodiscard]] platform::Value description() const;
 
 private:
@@ -85,10 +90,11 @@ private:
     mutable std::mutex _mutex; // guards all below
     std::int64_t _recorded = 0;
     std::array<std::int64_t, kFeedbackFates> _counts{};
-    std::int64_t _unresolved = 0; ///< of the unknown ones, those that may still be found
+    std::int64_t _unresolved = 0;     ///< unknown events that may still be found
+    std::deque<std::string> _settled; ///< uploads whose outcome is booked, the newest last
     bool _saveQueued = false;
     std::shared_ptr<platform::Queue> _queue;
-    std::mutex _saving; // keeps an older state from overwriting a newer one
+    std::mutex _saving; // orders the writes: an older state never overwrites a newer one
 };
 
 } // namespace tavrin

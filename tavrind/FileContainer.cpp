@@ -67,8 +67,8 @@ FileContainer::FileContainer(std::shared_ptr<const FileContainerStore> store, st
 {}
 
 FileContainer::FileContainer(std::shared_ptr<const FileContainerStore> store, std::filesystem::path fileUrl,
-                             std::unique_ptr<platform::AppendFile> fileHandle)
-    : _store(std::move(store)), _fileUrl(std::move(fileUrl)), _fileHandle(std::move(fileHandle))
+                             std::unique_ptr<platform::AppendFile> fileHandle, FileUse use)
+    : _store(std::move(store)), _fileUrl(std::move(fileUrl)), _use(use), _fileHandle(std::move(fileHandle))
 {}
 
 FileContainer::~FileContainer() = default;

@@ -35,6 +35,12 @@ struct FileContainerStore {
     std::uint64_t maxFileSize;              ///< in bytes; a written file is smaller, a file of this size is still read
 };
 
+/// What a session file is created for.
+enum class FileUse {
+    Session,
+    OneOff, ///< a session of one record, which a client may cause with every message
+};
+
 /// What reading a session file gave.
 struct FileReading {
     std::shared_ptr<StoredSession> session; ///< null if nothing could be read
@@ -55,7 +61,7 @@ public:
     FileContainer(std::shared_ptr<const FileContainerStore> store, std::filesystem::path fileUrl);
     /// A new file, open for writing.
     FileContainer(std::shared_ptr<const FileContainerStore> store, std::filesystem::path fileUrl,
-                  std::unique_ptr<platform::AppendFile> fileHandle);
+                  std::unique_ptr<platform::AppendFile> fileHandle, FileUse use = FileUse::Session);
     ~FileContainer();
 
     /// Appends the version and the header, asynchronously. If either fails, the file is closed and takes no events.
@@ -69,6 +75,7 @@ public:
     void close();
 
     [[nodiscard]] const std::filesystem::path& fileUrl() const { return _fileUrl; }
+    [[nodiscard]] FileUse use() const { return _use; }
 
     // On the queue.
 
@@ -90,6 +97,7 @@ private:
 
     const std::shared_ptr<const FileContainerStore> _store;
     const std::filesystem::path _fileUrl;
+    const FileUse _use = FileUse::Session;
     std::unique_ptr<platform::AppendFile> _fileHandle; // on the queue, like the count; null if closed
     std::uint64_t _feedbackCount = 0;
 };

@@ -38,7 +38,7 @@ template <> inline constexpr auto kTexts<FlusherIdentity> = texts("crowdsourcing
 /// The text of an identity; empty for any other number.
 [[nodiscard]] std::string_view convertIdentifierToString(FlusherIdentity identifier);
 
-/// The names of files that hold an upload's body while it is made begin like this; they are in the temporary directory.
+/// How the names of temporary files begin that hold an upload's body while it is written.
 inline constexpr std::string_view kUploadBodyPrefix = "flusher_";
 
 /// What the upload session stores with a task.

@@ -23,12 +23,19 @@ constexpr std::string_view kPrefix = "session.";
 constexpr double kDefaultMaxFileSize = 4u << 20;    // bytes
 constexpr double kDefaultMaxFileAge = 48 * 60 * 60; // seconds
 constexpr double kLargestLimit = 1e15;
-constexpr int kMaximumFiles = 2000; // open and waiting: each open one takes a descriptor
+/// Files open and waiting, by `FileUse`; each open one takes a descriptor. One-off sessions have a limit of their own,
+/// so that they never keep a real session from its file.
+constexpr std::array kMaximumFiles{2000, 100};
 constexpr int kMaximumNameAttempts = 16;
 
 const platform::Log& log()
 {
     return TavrinLogForCategory(kLogFeedbackStorage);
+}
+
+constexpr std::size_t index(FileUse use)
+{
+    return static_cast<std::size_t>(use);
 }
 
 double limit(const platform::UserDefaults& userDefaults, std::string_view key, double fallback)
@@ -102,7 +109,7 @@ std::optional<std::int32_t> TavrinPersistentStorage::_adopt(const std::string& n
     const bool isTooOld = platform::toSeconds(_assembly.device.clock.wallNow() - attributes->created) > _maxFileAge;
     _unsettled.push_back({container, isTooOld});
     if (isTooOld) return std::nullopt;
-    ++_fileCount;
+    ++_fileCounts[index(container->use())];
     _fileContainers.push_back(container);
     return sessionNumber(name);
 }
@@ -138,10 +145,10 @@ std::optional<fs::path> TavrinPersistentStorage::_newFileUrl()
     return _cachesUrl / (std::string(kPrefix) + std::to_string(_handleId++));
 }
 
-std::shared_ptr<FileContainer> TavrinPersistentStorage::createFileContainerForWriting()
+std::shared_ptr<FileContainer> TavrinPersistentStorage::createFileContainerForWriting(FileUse use)
 {
-    if (_fileCount >= kMaximumFiles) {
-        log().error("{} session files wait already: no other one", kMaximumFiles);
+    if (_fileCounts[index(use)] >= kMaximumFiles[index(use)]) {
+        log().error("{} session files of this use are waiting, no file created", kMaximumFiles[index(use)]);
         return nullptr;
     }
     // A name that something else has taken since the scan is skipped.
@@ -151,8 +158,8 @@ std::shared_ptr<FileContainer> TavrinPersistentStorage::createFileContainerForWr
         auto file = _assembly.fileManager.createForAppending(*fileUrl);
         if (file) {
             log().debug("new file url {}", fileUrl->string());
-            ++_fileCount;
-            return std::make_shared<FileContainer>(_store, *fileUrl, std::move(*file));
+            ++_fileCounts[index(use)];
+            return std::make_shared<FileContainer>(_store, *fileUrl, std::move(*file), use);
         }
         log().error("{}", file.error().description());
         if (file.error().code != EEXIST) break;
@@ -184,7 +191,7 @@ void TavrinPersistentStorage::closeSessionWithFileContainer(std::shared_ptr<File
 void TavrinPersistentStorage::deleteSessionWithFileContainer(std::shared_ptr<FileContainer> container)
 {
     _queue->async([self = shared_from_this(), container = std::move(container)] {
-        self->_fileCount -= static_cast<int>(std::erase(self->_fileContainers, container));
+        self->_fileCounts[index(container->use())] -= static_cast<int>(std::erase(self->_fileContainers, container));
         container->closeFile();
         const fs::path& fileUrl = container->fileUrl();
         if (fileUrl.empty())
@@ -193,6 +200,13 @@ void TavrinPersistentStorage::deleteSessionWithFileContainer(std::shared_ptr<Fil
         if (const auto removed = self->_assembly.fileManager.remove(fileUrl); !removed)
             log().error("File {} delete failed", fileUrl.string());
     });
+}
+
+void TavrinPersistentStorage::syncDeletions()
+{
+    _queue->sync([] {});
+    if (const auto synced = _assembly.fileManager.syncDirectory(_cachesUrl); !synced)
+        log().error("deleted session files may come back: {}", synced.error().description());
 }
 
 } // namespace tavrin

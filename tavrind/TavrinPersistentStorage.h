@@ -1,5 +1,6 @@
 #pragma once
 
+#include <array>
 #include <atomic>
 #include <cstdint>
 #include <deque>
@@ -19,6 +20,7 @@ namespace tavrin {
 struct Assembly;
 struct FileContainerStore;
 class FileContainer;
+enum class FileUse;
 
 /// Returns the number in the name of a session file ("session.17"); nothing for another name or a number that leaves no
 /// room for later ones.
@@ -36,14 +38,16 @@ public:
     explicit TavrinPersistentStorage(Assembly& assembly);
     ~TavrinPersistentStorage();
 
-    /// Creates a file for one session, open for writing; null if that fails.
-    [[nodiscard]] std::shared_ptr<FileContainer> createFileContainerForWriting();
+    /// Creates a file for one session, open for writing; null if that fails or too many files of this use exist.
+    [[nodiscard]] std::shared_ptr<FileContainer> createFileContainerForWriting(FileUse use);
     /// Returns the closed files in the order of their numbers. They stay in the list. Blocks on the queue.
     [[nodiscard]] std::vector<std::shared_ptr<FileContainer>> getAvailableSessionHandles();
     /// Closes a file and lists it, asynchronously.
     void closeSessionWithFileContainer(std::shared_ptr<FileContainer> container);
     /// Deletes a file and removes it from the list, asynchronously.
     void deleteSessionWithFileContainer(std::shared_ptr<FileContainer> container);
+    /// Blocks until the files deleted so far cannot come back after a power cut. Writes to disk; not on the queue.
+    void syncDeletions();
 
     [[nodiscard]] const FileContainerStore& store() const { return *_store; }
 
@@ -68,7 +72,7 @@ private:
 
     double _maxFileAge = 0; ///< in seconds
     std::atomic<std::int32_t> _handleId = 0;
-    std::atomic<int> _fileCount = 0;                             ///< session files, open and listed
+    std::array<std::atomic<int>, 2> _fileCounts{};               ///< files open and listed, by `FileUse`
     std::vector<std::shared_ptr<FileContainer>> _fileContainers; // on _queue
     std::deque<Found> _unsettled;                                // on _queue
 };

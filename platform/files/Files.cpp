@@ -227,6 +227,13 @@ public:
         return {};
     }
 
+    Result<void> syncDirectory(const fs::path& path) override
+    {
+        const FileHandle directory = openDirectory(path);
+        if (!directory || fsync(directory.fd()) != 0) return failure(path);
+        return {};
+    }
+
     Result<std::vector<std::string>> list(const fs::path& path) override
     {
         const std::unique_ptr<DIR, int (*)(DIR*)> directory(opendir(path.c_str()), closedir);

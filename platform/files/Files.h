@@ -75,6 +75,8 @@ public:
     [[nodiscard]] virtual Result<void> remove(const std::filesystem::path& path) = 0;
     /// Removes a directory with everything in it. One that isn't there is fine.
     [[nodiscard]] virtual Result<void> removeDirectory(const std::filesystem::path& path) = 0;
+    /// Makes what was created in a directory, and removed from it, last over a power cut.
+    [[nodiscard]] virtual Result<void> syncDirectory(const std::filesystem::path& path) = 0;
     /// The names in a directory, in no order, without "." and "..".
     [[nodiscard]] virtual Result<std::vector<std::string>> list(const std::filesystem::path& path) = 0;
     [[nodiscard]] virtual Result<FileHandle> openForReading(const std::filesystem::path& path) = 0;

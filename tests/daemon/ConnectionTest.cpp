@@ -273,8 +273,6 @@ TEST_F(ConnectionTest, EventsReachTheSessionWithTheirQuery)
     EXPECT_EQ(record.clientQueryId, 12u);
     EXPECT_EQ(record.userAgent, "Vistrel/4");
     EXPECT_EQ(record.feedback()->timestamp, device.clock.hostTicks()) << "stamped on arrival";
-    EXPECT_EQ(counter("vistrel.tophit.engagements"), 1);
-    EXPECT_EQ(counter("vistrel.tavrin.engagements"), 1);
 
     report(*connection, "ZRClearInputFeedback", {{"timestamp", 5}});
     EXPECT_EQ(session->records[1]->feedback()->timestamp, 5u);
@@ -284,6 +282,37 @@ TEST_F(ConnectionTest, EventsReachTheSessionWithTheirQuery)
     report(*connection, "TavrinConnectionInvalidated");
     report(*connection, "ZRSearchResult");
     EXPECT_EQ(session->records.size(), 2u) << "not a client's to send";
+}
+
+TEST_F(ConnectionTest, EngagementsOfTopHitsAndOfTheServicesResultsAreCounted)
+{
+    const auto named = client();
+    const auto nameless = client("org.example.app", "Example/1", 78);
+    struct {
+        FakeConnection& from;
+        std::string record;
+        int topHit;
+        int type;
+        std::int64_t topHits; ///< counted so far
+        std::int64_t ofService;
+    } const cases[] = {
+        {*named, "ZRResultEngagementFeedback", 0, 0, 0, 0},
+        {*named, "ZRResultEngagementFeedback", 2, 2, 1, 0},
+        {*named, "ZRResultEngagementFeedback", 1, 9, 2, 0},
+        {*named, "ZRResultEngagementFeedback", 0, 1, 2, 1},
+        {*named, "ZRResultEngagementFeedback", 2, 1, 3, 2},
+        {*named, "ZRResultRankingFeedback", 2, 1, 3, 2}, // no engagement
+        {*nameless, "ZRResultEngagementFeedback", 2, 1, 3, 2},
+    };
+    for (const auto& c : cases) {
+        report(
+            c.from, c.record,
+            {{"result", Value::dictionaryOf({{"class", "ZRSearchResult"}, {"type", c.type}, {"topHit", c.topHit}})}});
+        EXPECT_EQ(counter("vistrel.tophit.engagements"), c.topHits) << c.record << c.topHit << c.type;
+        EXPECT_EQ(counter("vistrel.tavrin.engagements"), c.ofService) << c.record << c.topHit << c.type;
+    }
+    report(*named, "ZRResultEngagementFeedback"); // without a result
+    EXPECT_EQ(counter("vistrel.tophit.engagements"), 3);
 }
 
 TEST_F(ConnectionTest, WarmsTheConnectionWhenASearchViewAppears)

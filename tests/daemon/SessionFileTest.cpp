@@ -46,7 +46,7 @@ struct SessionFileTest : FeedbackTest {
     /// A closed file with these events.
     std::shared_ptr<FileContainer> closedFile(const std::vector<std::string>& inputs)
     {
-        auto container = storage()->createFileContainerForWriting();
+        auto container = storage()->createFileContainerForWriting(FileUse::Session);
         container->writeSessionHeader(header());
         for (const std::string& input : inputs) {
             assembly().feedbackBooks.record(FeedbackFate::Open);
@@ -121,7 +121,7 @@ TEST_F(SessionFileTest, LimitsToTheByte)
     device.userDefaults.set("TAVSessionSizeLimit", 1000);
     start();
     LogCapture log;
-    auto container = storage()->createFileContainerForWriting();
+    auto container = storage()->createFileContainerForWriting(FileUse::Session);
     container->writeSessionHeader(header());
     device.drain();
     const std::string name = container->fileUrl().filename();
@@ -152,20 +152,31 @@ TEST_F(SessionFileTest, LimitsToTheByte)
 TEST_F(SessionFileTest, ARecordThatFailedIsNotThere)
 {
     start();
-    auto container = storage()->createFileContainerForWriting();
+    auto container = storage()->createFileContainerForWriting(FileUse::Session);
     container->writeSessionHeader(header());
     int failing = 1;
     device.files.fault = [&](std::string_view operation, const std::filesystem::path&) {
         return operation == "append" && failing++ % 2 == 0 ? ENOSPC : 0;
     };
-    device.drain(); // the version goes, the header fails
+    LogCapture log;
+    device.drain(); // the version is written, the header fails
+    EXPECT_EQ(log.count("Could not write version string"), 0);
+    EXPECT_EQ(log.count("Could not write root object"), 1);
     bool abandoned = false;
     container->writeFeedback(feedback("x"), platform::Reply<bool>([](bool) { FAIL() << "the file is closed"; },
                                                                   [&abandoned] { abandoned = true; }));
     device.drain();
     EXPECT_TRUE(abandoned);
 
-    container = storage()->createFileContainerForWriting();
+    container = storage()->createFileContainerForWriting(FileUse::Session);
+    failing = 2; // the version fails
+    container->writeSessionHeader(header());
+    device.drain();
+    EXPECT_EQ(log.count("Could not write version string"), 1);
+    EXPECT_EQ(log.count("Could not write root object"), 2) << "the file is closed";
+    EXPECT_EQ(contents(container->fileUrl().filename()), "");
+
+    container = storage()->createFileContainerForWriting(FileUse::Session);
     failing = -1; // odd: the version and the header go
     device.files.fault = {};
     container->writeSessionHeader(header());
@@ -290,7 +301,7 @@ TEST_F(SessionFileTest, TheProcessIsWantedWhileItEncodes)
     start();
     const auto watcher = std::make_shared<Watcher>();
     watcher->transactions = &device.transactions;
-    const auto container = storage()->createFileContainerForWriting();
+    const auto container = storage()->createFileContainerForWriting(FileUse::Session);
     container->writeFeedback(std::make_shared<TavrinFeedback>(watcher, 1, kGuid, "A/1"), {});
     device.drain();
     EXPECT_TRUE(watcher->seen.contains("archiveObject"));
@@ -316,7 +327,7 @@ TEST_F(SessionFileTest, EveryReadGivesTheSameUpload)
          {std::pair(some, R"(,"resource_versions":{"TAVCorrectionDict":"3"},"first_use":true,"base_time":1767225600,)"
                           R"("previous_session_end_reason":"no previous session"})"),
           {none, "}"}}) { // what is missing ends the list
-        const auto container = storage()->createFileContainerForWriting();
+        const auto container = storage()->createFileContainerForWriting(FileUse::Session);
         container->writeSessionHeader(head);
         container->writeFeedback(std::make_shared<TavrinFeedback>(chosen, 1, kGuid, "Vistrel/4"), {});
         storage()->closeSessionWithFileContainer(container);
@@ -332,7 +343,51 @@ TEST_F(SessionFileTest, EveryReadGivesTheSameUpload)
     }
 }
 
+TEST_F(SessionFileTest, UploadsAreInOrderOfTime)
+{
+    start();
+    const auto container = storage()->createFileContainerForWriting(FileUse::Session);
+    container->writeSessionHeader(header());
+    for (const std::uint64_t milliseconds : {70u, 50u, 1050u, 60u}) {
+        const auto engagement = std::make_shared<ZRResultEngagementFeedback>();
+        engagement->timestamp = milliseconds * 1'000'000 + 999'999;
+        engagement->result = std::make_shared<ZRSearchResult>();
+        engagement->result->identifier = std::to_string(milliseconds);
+        container->writeFeedback(std::make_shared<TavrinFeedback>(engagement, 1, kGuid, "Vistrel/4"), {});
+    }
+    storage()->closeSessionWithFileContainer(container);
+    device.drain();
+    MemoryOutputStream stream;
+    stream.open();
+    ASSERT_TRUE(container->read().session->getFeedbacksToSend(stream));
+    const Value events = platform::parseJson(stream.contents()).value()["fb"];
+    std::vector<std::int64_t> times;
+    for (std::size_t i = 0; i < events.count(); ++i) times.push_back(*events[i]["timestamp"].asInt());
+    EXPECT_EQ(times, (std::vector<std::int64_t>{0, 10, 20, 1000, 1000})) << "since the first; what is missing last";
+    EXPECT_EQ(events[4]["type"], Value("session_missing_results"));
+    EXPECT_EQ(events[4]["results"].count(), 4u);
+}
+
 // The directory
+
+TEST_F(SessionFileTest, FilesOfAnEarlierProcessAreCountedOneByOneAfterTheStart)
+{
+    start();
+    for (int i = 0; i < 3; ++i) closedFile({"a", "b"});
+    std::vector<std::string> operations;
+    device.files.fault = [&](std::string_view operation, const std::filesystem::path& path) {
+        if (path.filename().string().starts_with("session.") && operation != "info") operations.emplace_back(operation);
+        return 0;
+    };
+    const std::int64_t before = booked(FeedbackFate::Closed);
+    const auto scanned = TavrinPersistentStorage::make(assembly());
+    EXPECT_TRUE(operations.empty()) << "no file is read while the daemon starts";
+    const auto written = scanned->createFileContainerForWriting(FileUse::Session);
+    written->writeFeedback(feedback("x"), {});
+    device.drain();
+    EXPECT_EQ(operations, (std::vector<std::string>{"create", "read", "append", "read", "read"}));
+    EXPECT_EQ(booked(FeedbackFate::Closed) - before, 6);
+}
 
 TEST_F(SessionFileTest, NumbersGoOn)
 {
@@ -351,7 +406,7 @@ TEST_F(SessionFileTest, NumbersGoOn)
         for (const std::string& name : each.names) device.files.files[kDirectory + name] = "x";
         const auto scanned = TavrinPersistentStorage::make(assembly());
         EXPECT_EQ(scanned->getAvailableSessionHandles().size(), each.adopted) << each.next;
-        EXPECT_EQ(scanned->createFileContainerForWriting()->fileUrl().filename(), each.next);
+        EXPECT_EQ(scanned->createFileContainerForWriting(FileUse::Session)->fileUrl().filename(), each.next);
     }
 }
 
@@ -381,7 +436,7 @@ TEST_F(SessionFileTest, WhatStandsInTheWayIsLeftAlone)
     const auto scanned = TavrinPersistentStorage::make(assembly());
     EXPECT_TRUE(scanned->getAvailableSessionHandles().empty());
     device.files.directories.insert(std::string(kDirectory) + "session.6"); // since the scan
-    const auto container = scanned->createFileContainerForWriting();
+    const auto container = scanned->createFileContainerForWriting(FileUse::Session);
     ASSERT_TRUE(container);
     EXPECT_EQ(container->fileUrl().filename(), "session.7");
 }

@@ -128,6 +128,23 @@ TEST_F(SessionTest, SessionsEndAtTheirLimits)
     expectBooksClose();
 }
 
+TEST_F(SessionTest, EachClientOfItsOwnSessionHasItsOwnGuid)
+{
+    for (const bool shared : {true, false}) {
+        begin(shared);
+        appear();
+        auto other = client("com.quorvane.wendral", "Wendral/7", 78);
+        other->call("ReportEvent", {"event", std::int64_t{3}, Dictionary{{"class", "ZRClearInputFeedback"}}});
+        device.drain();
+        connection->end();
+        other->end();
+        const auto all = sessions();
+        ASSERT_EQ(all.size(), 2u);
+        EXPECT_NE(all[0]["user_guid"], Value(""));
+        EXPECT_EQ(all[0]["user_guid"] == all[1]["user_guid"], shared);
+    }
+}
+
 TEST_F(SessionTest, TimersOfAnEarlierSessionDoNothing)
 {
     begin();
@@ -138,7 +155,13 @@ TEST_F(SessionTest, TimersOfAnEarlierSessionDoNothing)
     device.advance(120s); // the first one's ten minutes are over
     EXPECT_EQ(state(), SessionState::Open);
     device.advance(481s);
-    EXPECT_EQ(state(), SessionState::SoftLimit);
+    EXPECT_EQ(state(), SessionState::SoftLimit); // five minutes are left
+    flushSession();
+    appear();
+    platform::test::LogCapture log;
+    device.advance(300s);
+    EXPECT_EQ(log.count("max timer expired expected 2 current 3"), 1);
+    EXPECT_EQ(state(), SessionState::Open);
 }
 
 TEST_F(SessionTest, LeapsOfTheSystemClockLoseNothingAndKeepNoSessionAlive)
@@ -349,11 +372,16 @@ TEST_F(SessionTest, OneOffSessions)
     EXPECT_EQ(features["base_time"], Value(0)) << "nobody shall know when these were";
     EXPECT_EQ(features["fb"][0]["query_id"], Value());
     EXPECT_EQ(features["user_guid"], Value(""));
+    EXPECT_EQ(features["agent"], Value("Vistrel/4"));
+    EXPECT_EQ(typesIn(features), Types{"custom_vistrel_result_features"});
+    EXPECT_EQ(typesIn(decoded(*uploads()[1])), Types{"custom_wendral_autofill"});
     EXPECT_GT(decoded(*uploads()[1])["base_time"].asInt().value_or(0), 0);
 
     auto stranger = connect(99); // has not configured
-    stranger->call("ReportEvent", {"event", std::int64_t{1}, Dictionary{{"class", "ZRClearInputFeedback"}}});
+    for (int i = 0; i < 3; ++i)
+        stranger->call("ReportEvent", {"event", std::int64_t{1}, Dictionary{{"class", "ZRClearInputFeedback"}}});
     device.drain();
+    EXPECT_EQ(sessionFiles().size(), 1u) << "one error for a connection";
     upload();
     const Value error = decoded(*uploads().at(2));
     EXPECT_EQ(typesIn(error), Types{"error"});

@@ -215,12 +215,84 @@ TEST_F(UploadTest, SessionFilesAreBounded)
 {
     begin();
     const Dictionary record{{"feedbackType", 3}, {"jsonFeedback", Dictionary()}}; // a session of its own
-    for (int i = 0; i < 2001; ++i) report("ZRCustomFeedback", record);
-    EXPECT_EQ(sessionFiles().size(), 2000u);
-    EXPECT_EQ(booked(FeedbackFate::NoContainer), 1);
+    for (int i = 0; i < 103; ++i) report("ZRCustomFeedback", record);
+    EXPECT_EQ(sessionFiles().size(), 100u);
+    EXPECT_EQ(booked(FeedbackFate::NoContainer), 3);
+    appear();
+    EXPECT_EQ(sessionFiles().size(), 101u) << "a real session has its file all the same";
     upload();
     report("ZRCustomFeedback", record);
-    EXPECT_EQ(sessionFiles().size(), 1u) << "there is room again";
+    EXPECT_EQ(sessionFiles().size(), 2u) << "there is room again";
+    expectBooksClose();
+
+    const auto& storage = assembly().persistentStorage;
+    int created = 1; // the open session's
+    while (storage->createFileContainerForWriting(FileUse::Session)) ++created;
+    EXPECT_EQ(created, 2000);
+}
+
+TEST_F(UploadTest, ASessionFileIsGoneBeforeItsUploadBegins)
+{
+    begin();
+    appear();
+    flushSession();
+    Types operations;
+    device.files.fault = [&operations](std::string_view operation, const std::filesystem::path& path) {
+        const std::string name = path.filename();
+        if ((operation == "remove" && name.starts_with("session.")) || operation == "syncdir" ||
+            (operation == "create" && name.starts_with("flusher_")))
+            operations.emplace_back(operation);
+        return 0;
+    };
+    upload();
+    EXPECT_EQ(operations, (Types{"remove", "syncdir", "create"})) << "a kill in between never sends a session twice";
+    ASSERT_EQ(uploads().size(), 1u);
+
+    device.files.fault = [](std::string_view operation, const auto&) { return operation == "syncdir" ? EIO : 0; };
+    LogCapture log;
+    uploadOne();
+    EXPECT_EQ(uploads().size(), 2u) << "nor does a disk that can't be synced lose it";
+    EXPECT_EQ(log.count("deleted session files may come back"), 1);
+}
+
+/// A task that has ended.
+struct EndedTask final : platform::BackgroundTask {
+    explicit EndedTask(Value note) : _note(std::move(note)) {}
+    void resume() override {}
+    void cancel() override {}
+    [[nodiscard]] std::uint64_t identifier() const override { return 4711; }
+    [[nodiscard]] const platform::UrlRequest& originalRequest() const override { return _request; }
+    [[nodiscard]] Value timingData() const override { return {}; }
+    void setNote(Value) override {}
+    [[nodiscard]] Value note() const override { return _note; }
+    [[nodiscard]] bool isUpload() const override { return true; }
+
+private:
+    platform::UrlRequest _request;
+    Value _note;
+};
+
+TEST_F(UploadTest, AnOutcomeIsOnDiskBeforeTheUploadIsForgottenAndIsBookedOnce)
+{
+    begin();
+    uploadOne();
+    const std::int64_t sent = booked(FeedbackFate::Sent);
+    const std::int64_t counted = counter("feedbacksent");
+    const UploadNote note{FlusherIdentity::Feedbacks, 7, 2, assembly().feedbackBooks.process()};
+    const auto task = std::make_shared<EndedTask>(note.value());
+    const auto complete = [&] {
+        assembly().backgroundFlusher->taskDidComplete(task, platform::UrlResponse{{}, true, 200, {}}, {});
+    };
+    complete();
+    const Value books =
+        platform::parseJson(device.files.files.at("/state/com.quorvane.tavrind/feedback-books.json")).value();
+    EXPECT_EQ(books["sent"], Value(sent + 2));
+    EXPECT_EQ(counter("feedbacksent") - counted, 7);
+
+    restart();
+    complete(); // the process was killed before the task was forgotten
+    EXPECT_EQ(booked(FeedbackFate::Sent), sent + 2);
+    EXPECT_EQ(counter("feedbacksent") - counted, 7);
     expectBooksClose();
 }
 
@@ -479,107 +551,6 @@ TEST_F(UploadTest, DamagedBooksBeginAnew)
         expectBooksClose();
         EXPECT_EQ(booked(FeedbackFate::Sent), 0) << damage;
     }
-}
-
-// The diagnostic bridge
-
-struct BridgeTest : UploadTest {
-    std::shared_ptr<FakeConnection> tool()
-    {
-        const auto call = connection->call("ListenToFlusher");
-        device.drain();
-        auto connected = device.ipc.connect(*call->argument(0).asString());
-        device.drain();
-        return connected;
-    }
-    void intent(FakeConnection& tool, std::uint64_t number)
-    {
-        tool.call("InitiateConnectionWithIntent", {Value(number)});
-        device.drain();
-    }
-    static Types signals(FakeConnection& tool)
-    {
-        Types names;
-        for (const auto& push : tool.takePushes()) names.push_back(push.signal);
-        return names;
-    }
-};
-
-TEST_F(BridgeTest, EventsAreShownLive)
-{
-    begin();
-    const auto watcher = tool();
-    appear();
-    EXPECT_TRUE(watcher->takePushes().empty()) << "before it asked";
-    intent(*watcher, 1);
-    report("ZRDidGoToSiteFeedback", {{"input", "example.org"}, {"timestamp", 7'654'321'000}}, 4);
-    auto pushes = watcher->takePushes();
-    ASSERT_EQ(pushes.size(), 1u);
-    EXPECT_EQ(pushes[0].signal, "ReceivedFeedbackDescription");
-    const auto event = platform::parseJson(*pushes[0].message.args[0].asString());
-    EXPECT_EQ(*event,
-              (Value(Dictionary{
-                  {"input", "example.org"}, {"query_id", 4}, {"type", "did_go_to_site"}, {"timestamp", 7654}})));
-    intent(*watcher, 7);
-    EXPECT_TRUE(watcher->takePushes().empty()) << "no such command";
-    watcher->end();
-    device.drain();
-    appear();
-    const auto next = tool();
-    intent(*next, 1);
-    appear();
-    EXPECT_EQ(signals(*next), Types{"ReceivedFeedbackDescription"});
-}
-
-TEST_F(BridgeTest, DumpEndsSessionsAndShowsTheBodies)
-{
-    begin();
-    const auto dumper = tool();
-    intent(*dumper, 2);
-    EXPECT_EQ(signals(*dumper), Types{"WorkDone"});
-    EXPECT_TRUE(assembly().backgroundFlusher->stopFlushing());
-    appear();
-    intent(*dumper, 3);
-    auto pushes = dumper->takePushes();
-    ASSERT_EQ(pushes.size(), 2u);
-    EXPECT_EQ(pushes[0].signal, "FlushedData");
-    EXPECT_EQ(pushes[1].signal, "WorkDone");
-    const auto body = tools::inflateRaw(pushes[0].message.args[0].asBytes()->view(), 1u << 20);
-    EXPECT_EQ(typesIn(platform::parseJson(*body).value()), (Types{"search_view_appear", "session_end"}));
-    EXPECT_EQ(uploads().size(), 1u) << "it is uploaded, too";
-    EXPECT_FALSE(assembly().backgroundFlusher->stopFlushing());
-
-    intent(*dumper, 3);
-    EXPECT_EQ(signals(*dumper), Types{"WorkDone"}) << "nothing left";
-}
-
-TEST_F(BridgeTest, AnUnknownCommandChangesNothing)
-{
-    begin();
-    const auto earlier = tool();
-    const auto last = tool();
-    intent(*earlier, 7);
-    LogCapture log;
-    earlier->end();
-    device.drain();
-    EXPECT_EQ(log.count("Removed remote listener"), 0) << "that is the last one to connect";
-    last->end();
-    device.drain();
-    EXPECT_EQ(log.count("Removed remote listener"), 1);
-}
-
-TEST_F(BridgeTest, EachToolGetsWhatItAskedFor)
-{
-    begin();
-    const auto bodies = tool();
-    const auto events = tool();
-    intent(*bodies, 0); // the other one connected last
-    intent(*events, 1);
-    appear();
-    EXPECT_EQ(signals(*events), Types{"ReceivedFeedbackDescription"});
-    intent(*events, 3);
-    EXPECT_EQ(signals(*events), (Types{"ReceivedFeedbackDescription", "WorkDone"})) << "the session's end, and its own";
-    EXPECT_EQ(signals(*bodies), Types{"FlushedData"});
 }
 
 // The stream

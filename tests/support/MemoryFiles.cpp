@@ -127,6 +127,12 @@ Result<void> MemoryFiles::removeDirectory(const fs::path& path)
     return {};
 }
 
+Result<void> MemoryFiles::syncDirectory(const fs::path& path)
+{
+    if (const int error = faultOf("syncdir", path)) return std::unexpected(Error::posix(error));
+    return {};
+}
+
 Result<std::vector<std::string>> MemoryFiles::list(const fs::path& path)
 {
     std::lock_guard lock(_mutex);

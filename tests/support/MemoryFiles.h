@@ -16,8 +16,8 @@ namespace platform::test {
 class MemoryFiles final : public FileSystem {
 public:
     /// Asked before every operation ("read", "write", "replace", "mkdir", "info", "remove", "list", "create", "append",
-    /// "lock", "temporary", "unsynced", "make", "sync", "take", "database") with its path; a number other than 0 is the
-    /// errno that it fails with.
+    /// "lock", "temporary", "unsynced", "make", "sync", "syncdir", "take", "database") with its path; a number other
+    /// than 0 is the errno that it fails with.
     std::function<int(std::string_view operation, const std::filesystem::path& path)> fault;
 
     std::map<std::filesystem::path, std::string> files;
@@ -35,6 +35,7 @@ public:
     Result<FileInfo> info(const std::filesystem::path& path) override;
     Result<void> remove(const std::filesystem::path& path) override;
     Result<void> removeDirectory(const std::filesystem::path& path) override;
+    Result<void> syncDirectory(const std::filesystem::path& path) override;
     Result<std::vector<std::string>> list(const std::filesystem::path& path) override;
     Result<FileHandle> openForReading(const std::filesystem::path& path) override;
     Result<std::unique_ptr<AppendFile>> createForAppending(const std::filesystem::path& path) override;
