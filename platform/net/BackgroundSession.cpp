@@ -29,6 +29,7 @@ constexpr std::size_t kMaximumNote = 128u << 10; // any URL
 /// Bytes of a request's URL, header fields and own body.
 constexpr std::size_t kMaximumRequest = 256u << 10;
 constexpr Duration kLongestHold = std::chrono::hours(24);
+constexpr Duration kStoreRetryDelay = std::chrono::minutes(1);
 constexpr Duration kLongestResourceTimeout = std::chrono::hours(24 * 366);
 
 Error refusal(std::int64_t code, std::string reason)
@@ -261,7 +262,8 @@ private:
     const std::shared_ptr<UrlSession> _loads;
 
     std::unique_ptr<BackgroundStore> _store;
-    std::optional<Error> _storeError; // if there can't be a store
+    std::optional<Error> _storeError; // why there is none
+    Duration _storeRetry{};           // until then no new task tries to open it again
     LivedTime _time;
     std::map<std::uint64_t, Entry> _entries;
     std::vector<std::uint64_t> _leftOver; ///< ended tasks that could not be removed from the store yet
@@ -307,13 +309,17 @@ void Task::setNote(Value note)
 void Session::_openStore(bool make)
 {
     const fs::path directory = _environment.directory / folderName(_configuration.identifier);
-    if (_store || _storeError || (!make && !BackgroundStore::exists(_environment.files, directory))) return;
+    if (_store || (!make && !BackgroundStore::exists(_environment.files, directory))) return;
+    if (_storeError && _time.now() < _storeRetry) return;
     auto store = BackgroundStore::open(_environment.files, directory);
     if (!store) {
         const Error error = store.error();
         defaultLog().error("background transfers can't be kept in {}: {}", directory.string(), error.description());
         store = BackgroundStore::openTemporary(_environment.files, _environment.temporary);
-        if (!store) _storeError = store.error();
+        if (!store) {
+            _storeError = store.error();
+            _storeRetry = _time.now() + kStoreRetryDelay;
+        }
         _tell([error](BackgroundSessionDelegate& delegate) { delegate.sessionDidBecomeInvalid(error); });
     }
     if (!store) return;

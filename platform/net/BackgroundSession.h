@@ -52,7 +52,8 @@ public:
     /// No task is left of those that the session knew.
     virtual void sessionDidFinishEvents() {}
     /// The session's store can't be opened, or belongs to another process. The session works in a temporary directory,
-    /// and its tasks end with the process. If that isn't possible either, making a task fails.
+    /// and its tasks end with the process. If that isn't possible either, making a task fails; a task that is made a
+    /// minute later or more tries again.
     virtual void sessionDidBecomeInvalid(const Error&) {}
 };
 

@@ -367,6 +367,24 @@ TEST_F(BackgroundSessionTest, WhereTheStoreCantBeUsedTasksWorkAndEndWithTheProce
     }
 }
 
+TEST_F(BackgroundSessionTest, AStoreThatCannotBeOpenedIsTriedAgainAMinuteLater)
+{
+    const fs::path device = root / "device";
+    Process process(device);
+    test::writeFile(root / "body", "x");
+    const auto upload = [&] {
+        return process.session->uploadTask({.url = *Url::parse("https://a.example/")}, root / "body").has_value();
+    };
+    test::writeFile(device, ""); // in the way of its directories
+    EXPECT_FALSE(upload());
+    fs::remove(device);
+    fs::create_directory(device);
+    process.advance(59s);
+    EXPECT_FALSE(upload());
+    process.advance(1s);
+    EXPECT_TRUE(upload());
+}
+
 TEST_F(BackgroundSessionTest, ATaskThatCantBeKeptIsAnError)
 {
     BackgroundSessionConfiguration limits{.identifier = "uploads", .maximumTasks = 2, .maximumBodyBytes = 10};
