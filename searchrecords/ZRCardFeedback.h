@@ -6,16 +6,16 @@
 #include "searchrecords/ZRFeedback.h"
 #include "searchrecords/ZRSearchResult.h"
 
-/// Cards: a result opened in place, in sections.
+/// Cards: results opened in place, in sections.
 namespace tavrin {
 
-/// A section of a card. Feedback tells sections apart by their class alone.
+/// A section of a card. Feedback distinguishes sections by class only.
 struct ZRCardSection : platform::RecordOf<ZRCardSection> {
     static constexpr std::string_view kClass = "ZRCardSection";
     static constexpr auto fields() { return std::tuple<>{}; }
 };
 
-/// A section of running text, which opens further when it is engaged.
+/// A section of text that expands when it is engaged.
 struct ZRDescriptionCardSection : platform::RecordOf<ZRDescriptionCardSection, ZRCardSection> {
     static constexpr std::string_view kClass = "ZRDescriptionCardSection";
     static constexpr auto fields() { return std::tuple<>{}; }
@@ -60,7 +60,7 @@ struct ZRStoreCardSectionEngagementFeedback
     }
 };
 
-/// A card was left.
+/// A card disappeared.
 struct ZRCardViewDisappearFeedback : platform::RecordOf<ZRCardViewDisappearFeedback, ZRFeedback> {
     static constexpr std::string_view kClass = "ZRCardViewDisappearFeedback";
     CardViewDisappearTrigger cardViewDisappearEvent = CardViewDisappearTrigger::Unknown;

@@ -17,7 +17,7 @@ struct ZRStartNetworkSearchFeedback : platform::RecordOf<ZRStartNetworkSearchFee
     EndpointType endpoint = EndpointType::Unknown;
 
     ZRStartNetworkSearchFeedback() = default;
-    /// The record of a new request, with a fresh `uuid`.
+    /// Creates the record of a new request, with a new `uuid`.
     ZRStartNetworkSearchFeedback(std::string input_, std::string url_, platform::Value headers_,
                                  StartSearchTrigger triggerEvent_, EndpointType endpoint_);
 
@@ -29,16 +29,16 @@ struct ZRStartNetworkSearchFeedback : platform::RecordOf<ZRStartNetworkSearchFee
     }
 };
 
-/// The answer came, or the request failed.
+/// A request was answered or failed.
 struct ZREndNetworkSearchFeedback : platform::RecordOf<ZREndNetworkSearchFeedback, ZREndSearchFeedback> {
     static constexpr std::string_view kClass = "ZREndNetworkSearchFeedback";
 
     std::int64_t responseSize = 0;     ///< bytes of the body
-    std::int64_t statusCode = 0;       ///< 0 where there was no response
-    platform::Value networkTimingData; ///< as `UrlTask::timingData()` answers it; null for none
+    std::int64_t statusCode = 0;       ///< 0 without a response
+    platform::Value networkTimingData; ///< as `UrlTask::timingData()` returns it, or null
 
     ZREndNetworkSearchFeedback() = default;
-    /// `start` gives its `uuid`; null for a request without a start record.
+    /// Takes the `uuid` of `start`, which may be null.
     ZREndNetworkSearchFeedback(const std::shared_ptr<ZRStartNetworkSearchFeedback>& start, std::size_t responseSize_,
                                std::int64_t statusCode_, platform::Value networkTimingData_);
 

@@ -8,7 +8,7 @@
 #include "searchrecords/ZRFeedback.h"
 #include "searchrecords/ZRSearchResult.h"
 
-/// What became of results, sections and suggestions: ranked, shown, engaged.
+/// Events of results, sections and suggestions: ranked, shown, engaged.
 namespace tavrin {
 
 /// Results came into view.
@@ -29,8 +29,8 @@ struct ZRResultRankingFeedback : platform::RecordOf<ZRResultRankingFeedback, ZRF
     static constexpr std::string_view kClass = "ZRResultRankingFeedback";
     std::shared_ptr<ZRSearchResult> result;
     std::uint64_t localResultPosition = 0;                         ///< within the section, before the service's ranking
-    std::vector<std::shared_ptr<ZRSearchResult>> hiddenResults;    ///< left out in favour of this one
-    std::vector<std::shared_ptr<ZRSearchResult>> duplicateResults; ///< the same thing from elsewhere
+    std::vector<std::shared_ptr<ZRSearchResult>> hiddenResults;    ///< hidden in favour of this one
+    std::vector<std::shared_ptr<ZRSearchResult>> duplicateResults; ///< the same result from other sources
     static constexpr auto fields()
     {
         using Self = ZRResultRankingFeedback;
@@ -87,7 +87,7 @@ struct ZRResultEngagementFeedback : platform::RecordOf<ZRResultEngagementFeedbac
     }
 };
 
-/// Results came too late to be shown.
+/// Results came too late to be displayed.
 struct ZRResultsReceivedAfterTimeoutFeedback : platform::RecordOf<ZRResultsReceivedAfterTimeoutFeedback, ZRFeedback> {
     static constexpr std::string_view kClass = "ZRResultsReceivedAfterTimeoutFeedback";
     RecordArray<ZRSearchResult> results;
@@ -97,7 +97,7 @@ struct ZRResultsReceivedAfterTimeoutFeedback : platform::RecordOf<ZRResultsRecei
     }
 };
 
-/// Sections came late and were added below those shown.
+/// Sections came late and were added below the others.
 struct ZRLateSectionsAppendedFeedback : platform::RecordOf<ZRLateSectionsAppendedFeedback, ZRFeedback> {
     static constexpr std::string_view kClass = "ZRLateSectionsAppendedFeedback";
     RecordArray<ZRResultSection> sections;

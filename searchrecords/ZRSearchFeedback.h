@@ -7,7 +7,7 @@
 #include "searchrecords/ZREnums.h"
 #include "searchrecords/ZRFeedback.h"
 
-/// Searches that start and end. The end names its start by `uuid`.
+/// Starts and ends of searches. An end has the `uuid` of its start.
 namespace tavrin {
 
 struct ZRStartSearchFeedback : platform::RecordOf<ZRStartSearchFeedback, ZRFeedback> {
@@ -16,7 +16,7 @@ struct ZRStartSearchFeedback : platform::RecordOf<ZRStartSearchFeedback, ZRFeedb
     std::optional<std::string> input; ///< what the user had typed
     StartSearchTrigger triggerEvent = StartSearchTrigger::Unknown;
     std::optional<std::string> uuid; ///< of this search
-    std::uint64_t queryId = 0;       ///< the client's own number for the query; 0 is none
+    std::uint64_t queryId = 0;       ///< the client's own number of the query; 0 for none
 
     static constexpr auto fields()
     {

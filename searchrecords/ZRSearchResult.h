@@ -9,26 +9,26 @@
 #include "platform/values/Record.h"
 #include "searchrecords/ZREnums.h"
 
-/// What a search finds: results, sections of them, and suggestions.
+/// What a search finds: results, sections and suggestions.
 namespace tavrin {
 
-/// Records that a client may leave out, which is not the same as sending none.
+/// An array of records that may be missing, which differs from an empty one.
 template <class T> using RecordArray = std::optional<std::vector<std::shared_ptr<T>>>;
 
-/// A piece of text as it is shown.
+/// A displayed text.
 struct ZRText : platform::RecordOf<ZRText> {
     static constexpr std::string_view kClass = "ZRText";
     std::optional<std::string> text;
     static constexpr auto fields() { return std::tuple{platform::field("text", &ZRText::text)}; }
 };
 
-/// A place outside the search view that an engagement opens.
+/// A destination outside the search view.
 struct ZRPunchout : platform::RecordOf<ZRPunchout> {
     static constexpr std::string_view kClass = "ZRPunchout";
     std::optional<std::string> bundleIdentifier; ///< of the application that opens it
-    std::vector<std::string> urls;               ///< ways to open it, the one the client prefers first
+    std::vector<std::string> urls;               ///< ways to open it, in the client's order of preference
 
-    /// The URL that the client would open; null for none.
+    /// Returns the URL that the client would open, or null. Valid while the record is unchanged.
     [[nodiscard]] const std::string* preferredOpenableURL() const { return urls.empty() ? nullptr : &urls.front(); }
 
     static constexpr auto fields()
@@ -55,7 +55,7 @@ struct ZRSearchResult : platform::RecordOf<ZRSearchResult> {
     static constexpr std::string_view kClass = "ZRSearchResult";
 
     std::optional<std::string> identifier;
-    std::uint64_t queryId = 0; ///< the client's number of the query that found it; 0 is none
+    std::uint64_t queryId = 0; ///< the client's number of the query that found it; 0 for none
     ResultType type = ResultType::Unknown;
     double rankingScore = 0;
     TopHit topHit = TopHit::No;
@@ -65,11 +65,11 @@ struct ZRSearchResult : platform::RecordOf<ZRSearchResult> {
     std::optional<std::string> applicationBundleIdentifier; ///< of the application that the result is in
     bool isLocalApplicationResult = false;                  ///< the result is an application installed here
     bool publiclyIndexable = false;
-    std::optional<std::string> correctedQuery; ///< the query that found it, where it isn't the one typed
-    bool staticCorrection = false;             ///< that correction came from a fixed list
+    std::optional<std::string> correctedQuery; ///< the query that found it, if not the typed one
+    bool staticCorrection = false;             ///< the correction came from a fixed list
     std::shared_ptr<ZRPunchout> punchout;      ///< what engaging the result opens
-    platform::Value localFeatures;             ///< what the device's ranking knows of it; null for nothing
-    /// What the maker of the result added: a `TAVCustomSearchResult` for results of the service.
+    platform::Value localFeatures;             ///< what the device's ranking knows about it, or null
+    /// What the source of the result added: a `TAVCustomSearchResult` for results of the service.
     std::shared_ptr<platform::Record> customProperties;
 
     static constexpr auto fields()
@@ -94,7 +94,7 @@ struct ZRSearchResult : platform::RecordOf<ZRSearchResult> {
     }
 };
 
-/// Results that are shown under one header.
+/// Results under one header.
 struct ZRResultSection : platform::RecordOf<ZRResultSection> {
     static constexpr std::string_view kClass = "ZRResultSection";
 
@@ -112,7 +112,7 @@ struct ZRResultSection : platform::RecordOf<ZRResultSection> {
     }
 };
 
-/// Words offered to search for instead of those typed.
+/// A suggested query.
 struct ZRSearchSuggestion : platform::RecordOf<ZRSearchSuggestion> {
     static constexpr std::string_view kClass = "ZRSearchSuggestion";
 

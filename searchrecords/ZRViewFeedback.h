@@ -6,7 +6,7 @@
 #include "searchrecords/ZREnums.h"
 #include "searchrecords/ZRFeedback.h"
 
-/// What happened to the search view and its input field, and what a client reports in words of its own.
+/// Events of the search view and its input field, and custom records.
 namespace tavrin {
 
 struct ZRSearchViewAppearFeedback : platform::RecordOf<ZRSearchViewAppearFeedback, ZRFeedback> {
@@ -41,18 +41,18 @@ struct ZRClearInputFeedback : platform::RecordOf<ZRClearInputFeedback, ZRFeedbac
     }
 };
 
-/// The user went to the site that was typed, without a search.
+/// The user opened the typed site without a search.
 struct ZRDidGoToSiteFeedback : platform::RecordOf<ZRDidGoToSiteFeedback, ZRFeedback> {
     static constexpr std::string_view kClass = "ZRDidGoToSiteFeedback";
     std::optional<std::string> input;
     static constexpr auto fields() { return std::tuple{platform::field("input", &ZRDidGoToSiteFeedback::input)}; }
 };
 
-/// A record that the client has put into JSON itself.
+/// A record that is JSON of the client's own making.
 struct ZRCustomFeedback : platform::RecordOf<ZRCustomFeedback, ZRFeedback> {
     static constexpr std::string_view kClass = "ZRCustomFeedback";
     CustomFeedbackType feedbackType = CustomFeedbackType::Unknown;
-    platform::Value jsonFeedback; ///< a dictionary, sent as it is
+    platform::Value jsonFeedback; ///< a dictionary, uploaded unchanged
     static constexpr auto fields()
     {
         using Self = ZRCustomFeedback;

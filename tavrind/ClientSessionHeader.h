@@ -7,17 +7,17 @@
 
 namespace tavrin {
 
-/// What a session file says about its session: what the upload needs beside the events.
+/// The header of a session file: what an upload has besides the events.
 struct ClientSessionHeader : platform::RecordOf<ClientSessionHeader> {
     static constexpr std::string_view kClass = "ClientSession";
 
     std::string agent; ///< the client's user agent
     platform::Uuid userGuid;
-    platform::Value resourceVersions;       ///< dictionary: resource identifier to version; null for none
+    platform::Value resourceVersions;       ///< dictionary of resource identifiers to versions, or null
     std::optional<platform::Date> baseTime; ///< when the session began
     std::int64_t previousSessionEndReason = 0;
     bool firstUse = false;         ///< the client's first session of the day
-    bool removeTimestamps = false; ///< nobody shall learn when the session began
+    bool removeTimestamps = false; ///< the upload must not tell when the session began
 
     static constexpr auto fields()
     {

@@ -39,7 +39,7 @@ const platform::Log& log()
 
 } // namespace
 
-/// An event on its way through the state machine.
+/// What comes with an event of the state machine.
 struct ClientSessionManager::Occasion {
     std::shared_ptr<TavrinFeedback> feedback{};
     std::shared_ptr<void> call{};
@@ -48,9 +48,9 @@ struct ClientSessionManager::Occasion {
 
 struct ClientSessionManager::Transition {
     SessionEvent event;
-    std::initializer_list<SessionState> states; ///< in which it acts; in others the event is ignored
+    std::initializer_list<SessionState> states; ///< the event is ignored in others
     void (ClientSessionManager::*action)(Occasion&);
-    std::optional<SessionState> next; ///< none: the state stays
+    std::optional<SessionState> next; ///< nothing if the state stays
 };
 
 using enum SessionState;

@@ -10,30 +10,30 @@ struct z_stream_s;
 
 namespace tavrin {
 
-/// Compresses what is written (raw DEFLATE, RFC 1951, without a header) into another stream, and digests it (SHA-512)
-/// as it was before. An error of the other stream is this stream's. One thread at a time.
+/// Compresses its input as raw DEFLATE (RFC 1951, without a header) into another stream, which it owns, and computes
+/// the SHA-512 digest of the uncompressed input. It fails when the other stream fails. One thread at a time.
 class CompressedOutputStream final : public OutputStream {
 public:
-    /// Into memory.
+    /// Writes to memory.
     CompressedOutputStream();
     explicit CompressedOutputStream(std::unique_ptr<OutputStream> outputStream);
     ~CompressedOutputStream() override;
 
-    /// Opens the other stream, too.
+    /// Also opens the other stream.
     void open() override;
     std::ptrdiff_t write(std::string_view bytes) override;
-    /// Writes what the compressor still holds, lets go of it, and closes the other stream. A stream that was closed, be
-    /// it before it was opened, can't be opened again.
+    /// Flushes and releases the compressor, and closes the other stream. A closed stream can't be opened again, even if
+    /// it was never open.
     void close() override;
     [[nodiscard]] StreamStatus streamStatus() const override { return _status; }
     [[nodiscard]] std::optional<platform::Error> streamError() const override { return _error; }
 
-    /// The digest of the uncompressed bytes, as 128 small hexadecimal digits. Complete once the stream is closed.
+    /// The digest of the uncompressed bytes as 128 lower-case hexadecimal digits. Valid after `close`.
     [[nodiscard]] std::string dataDigestForStream() const;
     [[nodiscard]] const OutputStream& outputStream() const { return *_outputStream; }
 
 private:
-    /// Runs the compressor over `bytes`; false after an error.
+    /// Compresses `bytes`. Returns false after an error.
     bool _deflate(std::string_view bytes, int flush);
     void _fail(platform::Error error);
 

@@ -24,7 +24,7 @@ constexpr std::size_t kMaximumFileSize = 64 * 1024;
 /// Uploads that `isSettled` remembers: the upload session forgets an outcome a moment after it is booked.
 constexpr std::size_t kMaximumSettled = 100;
 
-/// By fate. From kFirstDropped on they are reasons of a drop.
+/// The keys of the fates. From `kFirstDropped` on they are reasons of a drop.
 constexpr std::array<std::string_view, kFeedbackFates> kNames{
     "open",        "closed",        "uploading",  "sent",          "notSent",    "unknown",      "feedbackOff",
     "noContainer", "refusedAppend", "fileTooBig", "tooOld",        "unreadable", "otherVersion", "damagedTail",
@@ -56,7 +56,7 @@ void FeedbackBooks::_load()
     }
     const auto books = platform::parseJson(contents->view(), kMaximumFileSize);
     if (!books || !books->asDictionary())
-        return TavrinLogForCategory(kLogFeedback).error("feedback books are damaged, beginning new ones");
+        return TavrinLogForCategory(kLogFeedback).error("feedback books are damaged and begin anew");
 
     for (std::size_t fate = 0; fate < kFeedbackFates; ++fate) {
         const Value& group = fate < kFirstDropped ? *books : (*books)["dropped"];

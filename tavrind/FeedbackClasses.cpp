@@ -19,9 +19,9 @@ namespace {
 using enum EventType;
 using platform::Value;
 
-// What the rows of the table are made of.
+// The cells of the table.
 
-// The part of a record that leads to its query, or holds its identifiers.
+// Parts of a record.
 constexpr auto result = [](auto& record) -> auto& { return record.result; };
 constexpr auto results = [](auto& record) -> auto& { return record.results; };
 constexpr auto section = [](auto& record) -> auto& { return record.section; };
@@ -30,7 +30,7 @@ constexpr auto suggestion = [](auto& record) -> auto& { return record.suggestion
 constexpr auto suggestions = [](auto& record) -> auto& { return record.suggestions; };
 constexpr auto itself = [](auto& record) -> auto& { return record; };
 
-// Where the client's query id comes from: the record itself, or the first result in it.
+// The client's query id: that of the record itself, or of the first result in it.
 
 std::uint64_t queryIdIn(const std::shared_ptr<ZRSearchResult>& found)
 {
@@ -54,7 +54,7 @@ constexpr auto noQuery = [](const auto&) -> std::uint64_t { return 0; };
 constexpr auto ownQuery = [](const auto& record) { return record.queryId; };
 template <auto kPart> constexpr auto queryOf = [](const auto& record) { return queryIdIn(kPart(record)); };
 
-// Which identifiers are replaced, and whether the record shows what has them.
+// The privacy mapping: which results and suggestions a record shows or refers to.
 
 constexpr auto keepsIdentifiers = [](auto&, SessionProcessingHelper&) {};
 template <auto kPart>
@@ -255,13 +255,13 @@ void addReason(JsonFields& fields, const TavrinSessionEndFeedback& record)
     fields("reason", TavrinSessionEndFeedback::triggerEventEnumToString(record.reason));
 }
 
-/// A custom record is its event, as the client made it.
+/// The JSON of a custom record is the whole event.
 void addReadyMade(JsonFields& fields, const ZRCustomFeedback& record)
 {
     if (const platform::Dictionary* made = record.jsonFeedback.asDictionary()) fields.object() = *made;
 }
 
-/// By the custom record's own type. Autofill and crowdsourcing stand crosswise to the event types.
+/// The event types are not in the order of the custom types: autofill and crowdsourcing are crossed.
 EventType customEventType(const ZRCustomFeedback& record)
 {
     constexpr std::array kTypes{CustomUnknown, CustomWendralAutofill, CustomCrowdsourcing, CustomVistrelResultFeatures};
@@ -269,7 +269,7 @@ EventType customEventType(const ZRCustomFeedback& record)
     return type < kTypes.size() ? kTypes[type] : CustomUnknown;
 }
 
-/// A row for the class `R`. `kType` is its event, or finds it out.
+/// A row for the class `R`. `kType` is its event type, or a function that returns it.
 template <class R, auto kType, auto kFields = noFields, auto kQuery = noQuery, auto kProcess = keepsIdentifiers>
 consteval FeedbackClass row()
 {
@@ -291,8 +291,8 @@ consteval FeedbackClass row()
 }
 
 constexpr FeedbackClass kClasses[] = {
-    // class, event, fields; then, where a record has them: the client's query, and identifiers to be replaced
-    row<ZRFeedback, Unknown>(), // of clients that know no better, and any class without a row
+    // class, event type, JSON fields, client's query id, privacy mapping
+    row<ZRFeedback, Unknown>(), // also for any class without a row
 
     row<ZRStartSearchFeedback, SearchStart, addSearch, ownQuery>(),
     row<ZREndSearchFeedback, SearchEnd, addSearchEnd>(),
@@ -310,13 +310,13 @@ constexpr FeedbackClass kClasses[] = {
     row<ZRClearInputFeedback, ClearInput, addTrigger>(),
     row<ZRDidGoToSiteFeedback, DidGoToSite, addInput>(),
 
-    // A ranker's record holds a ranking, too: its results count as shown, though its event has none of them.
+    // A ranker's record extends a ranking: its results count as shown, though its event leaves them out.
     row<ZRRankingFeedback, RankSections, addRanking, queryOf<sections>, shows<sections>>(),
     row<TAVRankerFeedback, RankSections, addRankerRun, queryOf<sections>, shows<sections>>(),
     row<ZRSectionRankingFeedback, Unknown, addObject, noQuery, shows<itself>>(),
     row<ZRResultRankingFeedback, Unknown, addObject, noQuery, shows<itself>>(),
 
-    // Whole results come with their ranking: those in view are only referred to.
+    // Visible results are only referred to: the whole results are in the ranking and section events.
     row<ZRVisibleResultsFeedback, VisibleResults, addVisibleResults, queryOf<results>, refersTo<results>>(),
     row<ZRResultsReceivedAfterTimeoutFeedback, ResultsReceivedAfterTimeout, addResults, queryOf<results>,
         shows<results>>(),

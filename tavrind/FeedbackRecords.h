@@ -11,15 +11,15 @@ namespace tavrin {
 
 struct ZRStartNetworkSearchFeedback;
 
-/// The record of a request that is about to be sent.
+/// Creates the record of a request that is about to be sent.
 [[nodiscard]] std::shared_ptr<ZRStartNetworkSearchFeedback>
 startNetworkSearchFeedback(std::string input, const platform::UrlRequest& request, StartSearchTrigger trigger,
                            EndpointType endpoint);
 
-/// Header fields as a dictionary of strings; of fields of one name the last counts.
+/// Returns header fields as a dictionary of strings. If a name occurs twice, the last value counts.
 [[nodiscard]] platform::Value headerDictionary(const platform::HttpHeaders& headers);
 
-/// The time-out of a request from what a client or the bag asked for, in seconds above 0: a day at most.
+/// Converts a time-out that a client or the bag asks for, in seconds above 0. The result is a day at most.
 [[nodiscard]] platform::Duration requestTimeout(double seconds);
 
 /// Header fields for a log line.

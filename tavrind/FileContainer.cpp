@@ -29,7 +29,7 @@ const platform::Log& log()
     return TavrinLogForCategory(kLogFeedbackStorage);
 }
 
-/// Records that a session file may hold.
+/// The classes of records in a session file.
 const platform::RecordClasses& fileRecordClasses()
 {
     static const auto classes = [] {
@@ -50,7 +50,7 @@ std::string archived(const platform::Record& record)
     return platform::archive(record);
 }
 
-/// The next record; null if it can't be read.
+/// Returns the next record, or null if it can't be read.
 std::shared_ptr<platform::Record> readNext(ArchivedDataIterator& records)
 {
     const auto archive = records.readNextObject();
@@ -168,7 +168,7 @@ FileReading FileContainer::_read()
     if (!data) return _notRead(FeedbackFate::Unreadable, "mmap: " + data.error().description());
     try {
         return _unarchiveObject(*data);
-    } catch (const std::exception& exception) { // out of memory, or a fault of a library
+    } catch (const std::exception& exception) { // out of memory, or a failing library
         return _notRead(FeedbackFate::Unreadable, std::string("exception reading session archive ") + exception.what());
     }
 }

@@ -32,7 +32,7 @@ bool isCounts(std::string_view key)
     return key == "_kCFNTimingDataConnectionStartTimeCounts" || key == "_kCFNTimingDataConnectionStopTimeCounts";
 }
 
-/// The entries that count something.
+/// The entries that are numbers other than 0, by name.
 Dictionary counts(const Dictionary& all)
 {
     Dictionary counts;
@@ -45,7 +45,7 @@ Dictionary counts(const Dictionary& all)
 
 std::int64_t wholeMilliseconds(double seconds)
 {
-    constexpr double kLimit = 9.0e18; // a sender's nonsense shall not leave the range of the integer
+    constexpr double kLimit = 9.0e18; // clients report timing data too: any number must fit into the integer
     return static_cast<std::int64_t>(std::clamp(std::round(seconds * 1000), -kLimit, kLimit));
 }
 

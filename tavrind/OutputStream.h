@@ -16,21 +16,21 @@ namespace tavrin {
 
 enum class StreamStatus { NotOpen, Open, Closed, Error };
 
-/// Somewhere to write bytes to, in order: opened, written, closed. One thread at a time.
+/// A sink for bytes: open it, write to it, close it. One thread at a time.
 class OutputStream {
 public:
     virtual ~OutputStream() = default;
     virtual void open() = 0;
-    /// The number of bytes taken, all of them; -1 once the stream is in error or not open.
+    /// Writes all bytes and returns their number; -1 if the stream is in error or not open.
     virtual std::ptrdiff_t write(std::string_view bytes) = 0;
     virtual void close() = 0;
     [[nodiscard]] virtual StreamStatus streamStatus() const = 0;
-    /// Why the stream is in error; none if it isn't.
+    /// Returns why the stream is in error; nothing if it isn't.
     [[nodiscard]] virtual std::optional<platform::Error> streamError() const = 0;
     [[nodiscard]] virtual bool hasSpaceAvailable() const { return true; }
 };
 
-/// Into memory.
+/// Writes to memory.
 class MemoryOutputStream final : public OutputStream {
 public:
     void open() override { _status = StreamStatus::Open; }
@@ -50,14 +50,14 @@ private:
     std::string _contents;
 };
 
-/// To the end of a file.
+/// Appends to a file.
 class FileOutputStream final : public OutputStream {
 public:
     explicit FileOutputStream(std::unique_ptr<platform::AppendFile> file);
     ~FileOutputStream() override;
     void open() override;
     std::ptrdiff_t write(std::string_view bytes) override;
-    /// Closes the file, too.
+    /// Also closes the file.
     void close() override;
     [[nodiscard]] StreamStatus streamStatus() const override { return _status; }
     [[nodiscard]] std::optional<platform::Error> streamError() const override { return _error; }

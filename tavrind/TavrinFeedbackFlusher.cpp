@@ -132,7 +132,7 @@ void TavrinFeedbackFlusher::flush(std::shared_ptr<ZRCustomFeedback> record, std:
             const bool full =
                 self->_recordsBuffered == kMaximumRecords || size > kMaximumRecordBytes - self->_recordBytesBuffered;
             if (full) {
-                log().error("{} records of {} bytes wait already, dropping one of {} bytes", self->_recordsBuffered,
+                log().error("{} records of {} bytes are waiting, dropping one of {} bytes", self->_recordsBuffered,
                             self->_recordBytesBuffered, size);
             } else {
                 ++self->_recordsBuffered;
@@ -165,7 +165,7 @@ void TavrinFeedbackFlusher::flushToWireAsync(std::move_only_function<void(Bodies
 {
     _queueBuffer->async([self = shared_from_this(), callback = std::move(callback)]() mutable {
         Bodies bodies = self->flushToWireWithObjectsReturned(static_cast<bool>(callback));
-        // The counter of accepted connections is this one, too.
+        // This is also the counter of accepted connections.
         self->_assembly.diagnosticData.addValue(static_cast<std::int64_t>(bodies.size()),
                                                 "com.quorvane.tavrind.clientconnection");
         if (callback) callback(std::move(bodies));
@@ -305,7 +305,7 @@ void TavrinFeedbackFlusher::setEndpoint(std::optional<platform::Url> endpoint)
     });
 }
 
-/// Inside the bag controller's barrier.
+/// Called inside the bag controller's barrier.
 void TavrinFeedbackFlusher::bagChangeNotification(const std::shared_ptr<const TAVBag>& bag)
 {
     log().log("bag change notification received");

@@ -20,7 +20,7 @@ const platform::Log& log()
     return TavrinLogForCategory(kLogFlusher);
 }
 
-/// One tool's connection: its commands reach the bridge with its own proxy.
+/// Passes the commands of one tool's connection to the bridge, with the tool's own proxy.
 class ToolConnection final : public TAVFlusherXPC {
 public:
     ToolConnection(std::weak_ptr<TavrinFlusherXPC> bridge, std::shared_ptr<TAVFlusherListener> tool)
@@ -72,7 +72,7 @@ void TavrinFlusherXPC::_accept(const std::shared_ptr<platform::ipc::Connection>&
     const auto commands = std::make_shared<ToolConnection>(weak_from_this(), tool);
     connection->setPushErrorHandler([](const std::string& reason) { log().error("remote proxy error: {}", reason); });
     connection->exportObject(flusherHandler(commands));
-    // The handler keeps the connection, and what it exports, until the connection ends.
+    // The handler owns the connection and its exported object until the connection ends.
     connection->setInvalidationHandler([connection, commands, tool, weak = weak_from_this()] {
         log().log("listener invalidated");
         if (const auto self = weak.lock()) self->_removeDelegate(tool);

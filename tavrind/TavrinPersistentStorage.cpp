@@ -84,7 +84,7 @@ void TavrinPersistentStorage::_scanCacheDirectory()
 {
     if (_cachesUrl.empty()) return log().error("error scanning cache directory, could not get path");
     auto names = _assembly.fileManager.list(_cachesUrl);
-    if (!names && names.error().code == ENOENT) names.emplace(); // nothing was ever kept
+    if (!names && names.error().code == ENOENT) names.emplace(); // no session was ever stored
     if (!names) return log().error("error scanning cache directory {}", names.error().description());
     std::ranges::sort(*names, {}, [](const std::string& name) { return std::pair(sessionNumber(name), name); });
     std::int32_t largest = 0;
@@ -131,7 +131,7 @@ void TavrinPersistentStorage::_settleSoon()
     _queue->async([self = shared_from_this()] {
         if (self->_unsettled.empty()) return;
         self->_settle();
-        self->_settleSoon(); // as a task of its own: events that clients report are written in between
+        self->_settleSoon(); // in a task of its own, so that waiting events are written in between
     });
 }
 

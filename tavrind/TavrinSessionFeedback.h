@@ -10,12 +10,12 @@
 #include "searchrecords/ZRSearchResult.h"
 #include "tavrind/FeedbackEnumerations.h"
 
-/// The daemon's own events: what happened to a session, and what it lacks.
+/// The daemon's own events: what happened to a session, and which results and suggestions it lacks.
 namespace tavrin {
 
 /// Why a session ended; the value of a session's "previous_session_end_reason".
 enum class SessionEndReason : std::int64_t {
-    NoPreviousSession, ///< none ended yet
+    NoPreviousSession, ///< no session has ended yet
     ExternalRequest,
     SessionIdle,
     MaxSessionTime,
@@ -47,7 +47,7 @@ struct TavrinSessionEndFeedback : platform::RecordOf<TavrinSessionEndFeedback, Z
     static constexpr auto fields() { return std::tuple{platform::field("reason", &TavrinSessionEndFeedback::reason)}; }
 };
 
-/// Results that events of the session refer to and none showed. Nobody changes `results` once it is made.
+/// Results that events of the session refer to and none shows. `results` does not change after construction.
 struct TavrinSessionMissingResults : platform::RecordOf<TavrinSessionMissingResults, ZRFeedback> {
     static constexpr std::string_view kClass = "TavrinSessionMissingResults";
     std::vector<std::shared_ptr<ZRSearchResult>> results;
@@ -63,7 +63,7 @@ struct TavrinSessionMissingResults : platform::RecordOf<TavrinSessionMissingResu
     }
 };
 
-/// The same for suggestions.
+/// Suggestions that events of the session refer to and none shows.
 struct TavrinSessionMissingSuggestions : platform::RecordOf<TavrinSessionMissingSuggestions, ZRFeedback> {
     static constexpr std::string_view kClass = "TavrinSessionMissingSuggestions";
     std::vector<std::shared_ptr<ZRSearchSuggestion>> suggestions;
@@ -79,7 +79,7 @@ struct TavrinSessionMissingSuggestions : platform::RecordOf<TavrinSessionMissing
     }
 };
 
-/// A client's connection ended while the session it shares went on.
+/// A client's connection ended; the session that it shares goes on.
 struct TavrinConnectionInvalidated : platform::RecordOf<TavrinConnectionInvalidated, ZRFeedback> {
     static constexpr std::string_view kClass = "TavrinConnectionInvalidated";
     static constexpr auto fields() { return std::tuple<>{}; }

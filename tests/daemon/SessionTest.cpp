@@ -160,7 +160,7 @@ TEST_F(SessionTest, TimersOfAnEarlierSessionDoNothing)
     appear();
     platform::test::LogCapture log;
     device.advance(300s);
-    EXPECT_EQ(log.count("max timer expired expected 2 current 3"), 1);
+    EXPECT_EQ(log.count("max timer expired expected"), 1);
     EXPECT_EQ(state(), SessionState::Open);
 }
 
