@@ -3,12 +3,12 @@
 #include <cerrno>
 
 #include "CoreTavrin/TAVBag.h"
+#include "platform/base/Log.h"
 #include "platform/base/Uuid.h"
 #include "platform/device/Device.h"
 #include "platform/files/Files.h"
 #include "platform/net/BackgroundSession.h"
 #include "platform/run/Queue.h"
-#include "platform/text/Text.h"
 #include "platform/values/Dictionary.h"
 #include "platform/values/Json.h"
 #include "searchrecords/ZRViewFeedback.h"
@@ -30,7 +30,6 @@ namespace {
 constexpr platform::Duration kUploadTimeout = 300s;
 constexpr std::size_t kMaximumPath = 1024;
 constexpr int kMaximumNameAttempts = 16;
-constexpr std::size_t kLongestLoggedObject = 200; // bytes
 
 // Records that are sent on their own wait in memory for the next pass, for ten minutes or longer.
 constexpr std::size_t kMaximumRecords = 1000;
@@ -206,8 +205,7 @@ void TavrinFeedbackFlusher::_flushObject(Flushable& object, Bodies* bodies)
     stream.close();
     const auto error = stream.streamError();
     if (!count || error) { // the file is left where it is
-        const std::string text = object.description();
-        log().error("Invalid JSON Object {} error {}", platform::cut(text, kLongestLoggedObject),
+        log().error("Invalid JSON Object {} error {}", platform::Private{object.description()},
                     error ? error->description() : "not a dictionary");
         return drop(error ? FeedbackFate::NoBody : FeedbackFate::NotJson);
     }

@@ -155,7 +155,7 @@ void TavrinFlusherXPC::sendDataToReceivingStreamListener(const TavrinFeedback& f
     const bool logged = platform::Log::enabled(platform::LogLevel::Debug);
     if (!listener && !logged) return;
     const std::string description = feedback.description();
-    log().debug("id {} agent {} event {}", feedback.queryId, feedback.userAgent, description);
+    log().debug("id {} agent {} event {}", feedback.queryId, feedback.userAgent, platform::Private{description});
     if (listener) listener->receivedFeedbackDescription(description);
 }
 

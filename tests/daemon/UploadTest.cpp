@@ -147,14 +147,11 @@ TEST_F(UploadTest, CrowdsourcingRecordsGoOutOnTheirOwn)
     begin();
     report("ZRCustomFeedback", {{"feedbackType", 2}, {"jsonFeedback", Dictionary{{"tld", "ch"}}}});
     report("ZRCustomFeedback", {{"feedbackType", 2}}); // no JSON
-    std::string text = "a";
-    for (int i = 0; i < 200; ++i) text += "é";
-    report("ZRCustomFeedback", {{"feedbackType", 2}, {"jsonFeedback", Value::Array{text}}});
+    report("ZRCustomFeedback", {{"feedbackType", 2}, {"jsonFeedback", Value::Array{"seen"}}});
     EXPECT_EQ(counter("dp.submit"), 3);
     LogCapture log;
     upload();
-    EXPECT_EQ(log.count("Invalid JSON Object null error "), 1);
-    EXPECT_EQ(log.count("Invalid JSON Object [\"" + text.substr(0, 197) + " error "), 1) << "cut between characters";
+    EXPECT_EQ(log.count("Invalid JSON Object <private> error not a dictionary"), 2);
     EXPECT_EQ(temporaryFiles(), 2u) << "what could not be written stays";
     ASSERT_EQ(uploads().size(), 1u);
     EXPECT_EQ(assembly().crowdsourcingFeedbackFlusher->serverEndpoint()->string(), "https://f.example/crowd?y=2")
