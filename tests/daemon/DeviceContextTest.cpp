@@ -1,5 +1,7 @@
 // What the device is like, from the device to what the daemon sends and does.
 
+#include <cstdlib>
+
 #include <gtest/gtest.h>
 
 #include "CoreTavrin/TAVBag.h"
@@ -8,6 +10,7 @@
 #include "tavrind/TAVNetworkRequestFactory.h"
 #include "tavrind/TavrinBagController.h"
 #include "tavrind/TavrinUserGUIDController.h"
+#include "tavrind/TAVTracing.h"
 #include "tests/support/DaemonFixture.h"
 
 namespace tavrin::test {
@@ -163,7 +166,7 @@ TEST_F(DeviceContextTest, ALookupIsRepeatedUntilTheClientsTimeOut)
 
 TEST_F(DeviceContextTest, SettingsAreReadAtStart)
 {
-    const std::string session = "/caches/com.quorvane.tavrind/session.7";
+    const std::string file = "/caches/com.quorvane.tavrind/session.7";
     start();
     EXPECT_TRUE(device.loader.sessions[0]->configuration.allowFastOpenAndTickets);
     const bool privateData = platform::Log::privateData.exchange(false);
@@ -179,11 +182,27 @@ TEST_F(DeviceContextTest, SettingsAreReadAtStart)
     for (const auto& [age, kept] : {std::pair(7200.0, true), {3600.0, false}}) {
         device.userDefaults.set("TAVSessionMaxAge", age);
         device.files.directories.insert("/caches/com.quorvane.tavrind");
-        device.files.files[session] = "";
-        device.files.created[session] = device.clock.wallNow() - 5400s;
+        device.files.files[file] = "";
+        device.files.created[file] = device.clock.wallNow() - 5400s;
         start();
-        EXPECT_EQ(device.files.files.contains(session), kept) << age;
+        EXPECT_EQ(device.files.files.contains(file), kept) << age;
     }
+}
+
+TEST(TracingDeathTest, IsSwitchedByItsSettingOncePerProcess)
+{
+    GTEST_FLAG_SET(death_test_style, "threadsafe"); // in processes of their own, which have read nothing yet
+    for (const bool enabled : {false, true})
+        EXPECT_EXIT(
+            {
+                platform::test::TestDevice device;
+                device.userDefaults.set("TraceEnabled", enabled);
+                TAVTracingSetup(device.userDefaults);
+                device.userDefaults.set("TraceEnabled", !enabled);
+                TAVTracingSetup(device.userDefaults);
+                std::exit(TAVTraceEnabled ? 7 : 8);
+            },
+            testing::ExitedWithCode(enabled ? 7 : 8), "");
 }
 
 TEST_F(DeviceContextTest, WhatStartedTheDaemonIsLogged)
