@@ -71,7 +71,7 @@ std::optional<std::string> processWhitelist(std::string_view whitelist, platform
     const auto list = innerList(whitelist);
     if (!list) return std::nullopt;
     const std::vector<platform::InstalledApplication> applications = installed.applications();
-    std::unordered_map<std::string_view, std::optional<std::uint32_t>> found; // of what is installed, what is listed
+    std::unordered_map<std::string_view, std::optional<std::uint32_t>> found; // installed, and its id if listed
     found.reserve(applications.size());
     for (const platform::InstalledApplication& application : applications)
         if (!application.identifier.empty() && !application.version.empty()) found.try_emplace(application.identifier);

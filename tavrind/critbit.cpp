@@ -211,7 +211,7 @@ int critbit_allprefixed(const critbit_tree& tree, std::string_view prefix, critb
 
     std::array<std::byte, 1024> memory;
     std::pmr::monotonic_buffer_resource arena(memory.data(), memory.size());
-    std::pmr::vector<Link> later(&arena); // what is still to be visited, the next one last
+    std::pmr::vector<Link> later(&arena); // subtrees left to visit, the next one last
     later.reserve(64);
     for (link = top;; link = later.back(), later.pop_back()) {
         while (isInternal(link)) {

@@ -39,7 +39,7 @@ std::string languageTag(const icu::Locale& locale)
     return U_SUCCESS(status) ? tag : std::string("und");
 }
 
-/// The language of the user interface: with its script where that isn't the language's usual one.
+/// Returns the language of the user interface, with its script unless that is the language's usual one.
 std::string systemLanguage(icu::Locale locale)
 {
     UErrorCode status = U_ZERO_ERROR;
@@ -157,8 +157,8 @@ public:
     }
 
 private:
-    /// The system's files count from the moment that they change: until then the environment, which a login made from
-    /// them, does.
+    /// The system's files count only after they have changed: until then the environment does, which a login made from
+    /// them.
     LocaleContext read()
     {
         std::optional<std::string> name;

@@ -23,7 +23,7 @@ bool isSignificantMove(const Location& from, const Location& to)
     constexpr double kEarthRadius = 6371; // km
     constexpr double kSignificant = 10;   // km
     constexpr double kRadians = std::numbers::pi / 180;
-    // Haversine: exact enough close by, where it matters, and sound everywhere.
+    // The haversine formula is exact for short distances, which matter here, and stable for all others.
     const double rows = std::sin((to.latitude - from.latitude) * kRadians / 2);
     const double columns = std::sin((to.longitude - from.longitude) * kRadians / 2);
     const double a =

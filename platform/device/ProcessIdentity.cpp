@@ -20,7 +20,7 @@ namespace {
 constexpr std::size_t kMaximumPath = 4096;
 constexpr std::size_t kMaximumInfo = 64u << 10;
 
-/// The whole of a small file in /proc; nothing where it can't be read.
+/// Returns the contents of a small file in /proc, or nothing if it can't be read.
 std::string contentsOf(const std::string& path)
 {
     const FileHandle file(open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOFOLLOW));

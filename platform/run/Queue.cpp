@@ -87,7 +87,7 @@ bool Event::signalled() const
 struct SyncWaiter {
     std::condition_variable wake;
     bool granted = false;  // its turn has come, and it counts as running
-    bool mayDrain = false; // nobody else drains what stands before it
+    bool mayDrain = false; // no other thread drains the tasks before it
 };
 
 /// One place in the queue: a task, or a caller that waits to run its own.
@@ -114,7 +114,7 @@ private:
 
 /// A serial queue is a concurrent one whose every task is a barrier. What runs is counted in `shared` and `exclusive`;
 /// who ends a task calls `pump`, which gives the next place its turn: a waiting caller directly, a task through the
-/// first caller that waits behind it, or else through a job for the executor.
+/// first caller that waits after it, or else through a job for the executor.
 struct Queue::Core {
     std::string label;
     Kind kind;
@@ -128,7 +128,7 @@ struct Queue::Core {
     std::size_t jobs = 0;                                   // drain jobs handed to the executor and not begun
     unsigned shared = 0;                                    // shared tasks running
     bool exclusive = false;                                 // a barrier task running
-    std::vector<std::shared_ptr<Suspension>> suspensions{}; ///< in the order in which their continuations are to run
+    std::vector<std::shared_ptr<Suspension>> suspensions{}; ///< in the order of their continuations
 
     [[nodiscard]] bool mayStart(bool barrier) const
     {

@@ -138,7 +138,7 @@ private:
     msgpack::packer<Stream> _packer{_stream};
     std::vector<OpenRecord> _records;
     std::size_t _keyStart = 0;
-    std::size_t _keyEnd = std::string::npos; ///< where the bytes end right behind a field's key
+    std::size_t _keyEnd = std::string::npos; ///< where the bytes end if a field's key was the last thing written
 };
 
 // Reading
@@ -171,13 +171,13 @@ template <std::unsigned_integral Number> Number load(const char* from)
     return std::endian::native == std::endian::little ? std::byteswap(number) : number;
 }
 
-/// What the first byte of a value says of those that follow.
+/// What the first byte of a value tells about the following ones.
 struct Head {
     Value::Type type = Value::Type::Null;
-    std::uint8_t width = 0; ///< bytes of the number or length behind the first byte
+    std::uint8_t width = 0; ///< bytes of the number or length after the first byte
     bool isSigned = false;
     bool isKnown = true;
-    std::uint32_t number = 0; ///< where the first byte has it
+    std::uint32_t number = 0; ///< if the first byte contains it
 };
 
 /// MessagePack's table of first bytes (https://msgpack.org).
@@ -219,7 +219,7 @@ public:
         : Decoder(classes), _next(archive.data()), _end(_next + archive.size()), _valuesLeft(archive.size())
     {}
 
-    /// Says that nothing is to follow what was read.
+    /// Fails unless the whole archive was read.
     void finish()
     {
         if (!failed() && (_isRead || _next != _end)) fail("trailing bytes");
@@ -254,7 +254,7 @@ public:
     Bytes bytes() override { return Bytes(std::string(take(Value::Type::Bytes, "bytes").text())); }
     Date date() override { return Date(Duration(take(Value::Type::Date, "a date").integer)); }
     Value value() override { return value(kMaximumDepth); }
-    /// The value at hand, whose arrays and dictionaries may nest `levels` deep.
+    /// Reads the next value, in which arrays and dictionaries may nest `levels` deep.
     Value value(std::size_t levels)
     {
         const Token token = here();
@@ -312,7 +312,7 @@ public:
             return here().type == Value::Type::String;
         };
         const bool isClass = isText() && _here.text() == kClassKey && isText();
-        // Back to where it was.
+        // Restores the position.
         _here = first;
         _isRead = true;
         _next = contents;
@@ -355,7 +355,7 @@ public:
     }
 
 private:
-    /// The token at hand; null after a failure.
+    /// Returns the next token, or null after a failure.
     const Token& here()
     {
         if (!_isRead && !failed()) [[likely]]
@@ -365,7 +365,7 @@ private:
         return _here;
     }
 
-    /// The token at hand, which must be of that type; an empty one after a failure.
+    /// Returns the next token, which must be of that type; an empty one after a failure.
     Token take(Value::Type type, std::string_view expected)
     {
         const Token& token = here();
@@ -423,14 +423,14 @@ private:
         case Value::Type::Array:
         case Value::Type::Dictionary:
             _here.size = static_cast<std::uint32_t>(number);
-            // A value takes a byte at least. All containers together can't declare more of them, whoever reserves them.
+            // Every value takes at least one byte: all containers together can't declare more values than bytes.
             if (_here.contents() > _valuesLeft) return fail("truncated");
             _valuesLeft -= _here.contents();
             return;
         }
     }
 
-    /// The number behind the first byte, with its sign where it has one, or that in it.
+    /// Returns the number after the first byte, sign-extended if it is signed, or the one in the first byte.
     [[nodiscard]] std::uint64_t numberBehind(const Head& head) const
     {
         const auto signedAs = [&head](auto number) -> std::uint64_t {
@@ -446,7 +446,7 @@ private:
         }
     }
 
-    /// Makes a date of the extension at hand: a timestamp of 4, 8 or 12 bytes.
+    /// Reads an extension as a date: a timestamp of 4, 8 or 12 bytes.
     void readDate()
     {
         const char* body = _here.bytes;
@@ -481,8 +481,8 @@ private:
     const char* const _end;
     std::uint64_t _valuesLeft; ///< that containers may still declare
     Token _here;
-    bool _isRead = false;             ///< `_here` is the next value, and `_next` is behind it
-    std::vector<std::uint32_t> _left; ///< what is left to read of each container that was entered
+    bool _isRead = false;             ///< `_here` is the next value, and `_next` is after it
+    std::vector<std::uint32_t> _left; ///< values left in each open container
 };
 
 } // namespace

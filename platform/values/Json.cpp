@@ -374,7 +374,7 @@ struct JsonDocument::Parsed {
     Parsed(const Parsed&) = delete;
     Parsed& operator=(const Parsed&) = delete;
 
-    /// None where the document is no array.
+    /// Nothing if the document is no array.
     [[nodiscard]] std::optional<dom::array> elements() const
     {
         dom::array array;

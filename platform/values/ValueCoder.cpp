@@ -63,7 +63,7 @@ private:
     Value _root;
 };
 
-/// Reads a record out of its dictionary, which must stay as it is meanwhile.
+/// Reads a record from its dictionary, which must not change meanwhile.
 class ValueDecoder final : public Decoder {
 public:
     ValueDecoder(const Value& value, const RecordClasses& classes) : Decoder(classes), _here(&value) {}
