@@ -27,11 +27,19 @@ template <auto Free> struct FreeWith {
 using SslContext = std::unique_ptr<SSL_CTX, FreeWith<SSL_CTX_free>>;
 using Ssl = std::unique_ptr<SSL, FreeWith<SSL_free>>;
 
-SslContext makeTls(const tavrin::tools::CertificateFiles& files)
+SslContext makeTls(const tavrin::tools::CertificateFiles& files, const std::string& protocol)
 {
     SslContext context(SSL_CTX_new(TLS_server_method()));
     SSL_CTX_use_certificate_file(context.get(), files.certificate.c_str(), SSL_FILETYPE_PEM);
     SSL_CTX_use_PrivateKey_file(context.get(), files.key.c_str(), SSL_FILETYPE_PEM);
+    const auto choose = [](SSL*, const unsigned char** chosen, unsigned char* length, const unsigned char*, unsigned,
+                           void* wanted) {
+        const auto& only = *static_cast<const std::string*>(wanted);
+        *chosen = reinterpret_cast<const unsigned char*>(only.data());
+        *length = static_cast<unsigned char>(only.size());
+        return SSL_TLSEXT_ERR_OK;
+    };
+    if (!protocol.empty()) SSL_CTX_set_alpn_select_cb(context.get(), choose, const_cast<std::string*>(&protocol));
     return context;
 }
 
@@ -83,8 +91,11 @@ struct TestHttpServer::Impl {
 
     mutable std::mutex mutex;
     std::condition_variable arrived;
-    std::vector<Request> requests; // under the mutex
-    int connections = 0;           // under the mutex
+    std::condition_variable sent;
+    std::vector<Request> requests;   // under the mutex
+    int connections = 0;             // under the mutex
+    std::optional<Answer> sentToAll; // under the mutex
+    bool stopping = false;           // under the mutex
     std::thread thread;
 
     void listen()
@@ -116,11 +127,26 @@ struct TestHttpServer::Impl {
             std::vector<pollfd> watched{{wake.fd(), POLLIN, 0}, {listener.fd(), POLLIN, 0}};
             for (const auto& [fd, connection] : open) watched.push_back({fd, POLLIN, 0});
             if (poll(watched.data(), watched.size(), -1) < 0) continue;
-            if (watched[0].revents) return;
+            if (watched[0].revents && !obey()) return;
             if (watched[1].revents) accept();
-            for (std::size_t i = 2; i < watched.size(); ++i)
-                if (watched[i].revents && !serve(open.at(watched[i].fd))) open.erase(watched[i].fd);
+            for (std::size_t i = 2; i < watched.size(); ++i) {
+                const auto found = open.find(watched[i].fd);
+                if (watched[i].revents && found != open.end() && !serve(found->second)) open.erase(found);
+            }
         }
+    }
+
+    /// Does what the test asks for; false ends the server.
+    bool obey()
+    {
+        eventfd_t count = 0;
+        eventfd_read(wake.fd(), &count);
+        std::lock_guard lock(mutex);
+        for (auto entry = open.begin(); sentToAll && entry != open.end();)
+            entry = answer(entry->second, *sentToAll) ? std::next(entry) : open.erase(entry);
+        sentToAll.reset();
+        sent.notify_all();
+        return !stopping;
     }
 
     void accept()
@@ -154,6 +180,10 @@ struct TestHttpServer::Impl {
 
         Request request{.connection = connection.number,
                         .resumed = connection.ssl && SSL_session_reused(connection.ssl.get()) == 1};
+        if (!options.protocol.empty()) {
+            request.body = std::exchange(connection.received, {});
+            return answer(connection, handler(request));
+        }
         while (const std::size_t length = requestLength(connection.received, request)) {
             connection.received.erase(0, length);
             {
@@ -161,15 +191,22 @@ struct TestHttpServer::Impl {
                 requests.push_back(request);
             }
             arrived.notify_all();
-            const Answer answer = handler(request);
-            send(connection, answer.bytes);
-            if (answer.then == Then::Reset) {
-                const linger atOnce{.l_onoff = 1, .l_linger = 0};
-                setsockopt(connection.socket.fd(), SOL_SOCKET, SO_LINGER, &atOnce, sizeof atOnce);
-            }
-            if (answer.then != Then::KeepOpen) return false;
+            if (!answer(connection, handler(request))) return false;
         }
         return true;
+    }
+
+    /// Sends the answer; false ends the connection.
+    static bool answer(Connection& connection, const Answer& answer)
+    {
+        send(connection, answer.bytes);
+        if (answer.then == Then::Reset) {
+            const linger atOnce{.l_onoff = 1, .l_linger = 0};
+            setsockopt(connection.socket.fd(), SOL_SOCKET, SO_LINGER, &atOnce, sizeof atOnce);
+        } else if (answer.then == Then::Close && connection.ssl) {
+            SSL_shutdown(connection.ssl.get()); // as servers do
+        }
+        return answer.then == Then::KeepOpen;
     }
 
     /// A client that went away is the client's affair.
@@ -191,13 +228,17 @@ TestHttpServer::TestHttpServer(Handler handler, const Options& options) : _impl(
 {
     _impl->handler = std::move(handler);
     _impl->options = options;
-    if (options.certificate) _impl->tls = makeTls(*options.certificate);
+    if (options.certificate) _impl->tls = makeTls(*options.certificate, _impl->options.protocol);
     _impl->listen();
     _impl->thread = std::thread([impl = _impl.get()] { impl->run(); });
 }
 
 TestHttpServer::~TestHttpServer()
 {
+    {
+        std::lock_guard lock(_impl->mutex);
+        _impl->stopping = true;
+    }
     eventfd_write(_impl->wake.fd(), 1);
     _impl->thread.join();
 }
@@ -231,6 +272,14 @@ void TestHttpServer::waitForRequests(std::size_t count)
 {
     std::unique_lock lock(_impl->mutex);
     _impl->arrived.wait(lock, [&] { return _impl->requests.size() >= count; });
+}
+
+void TestHttpServer::sendToAll(const Answer& answer)
+{
+    std::unique_lock lock(_impl->mutex);
+    _impl->sentToAll = answer;
+    eventfd_write(_impl->wake.fd(), 1);
+    _impl->sent.wait(lock, [&] { return !_impl->sentToAll; });
 }
 
 std::string httpAnswer(int status, std::string_view body, std::string_view fields)

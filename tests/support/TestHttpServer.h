@@ -44,6 +44,8 @@ public:
     struct Options {
         std::string address = "127.0.0.1";                            ///< IPv4 or IPv6
         std::optional<tavrin::tools::CertificateFiles> certificate{}; ///< if set, the server speaks TLS
+        /// Negotiated over TLS in place of HTTP/1.1. What arrives then goes to the handler as it comes, as a body.
+        std::string protocol{};
     };
 
     explicit TestHttpServer(Handler handler);
@@ -56,6 +58,8 @@ public:
     [[nodiscard]] std::vector<Request> requests() const;
     /// Blocks until `count` requests have been read in all.
     void waitForRequests(std::size_t count);
+    /// Sends on every open connection what the handler didn't. Blocks until it is sent.
+    void sendToAll(const Answer& answer);
 
 private:
     struct Impl;

@@ -38,15 +38,18 @@ struct Outcome {
 /// One task and what becomes of it.
 class Load {
 public:
-    Load(UrlSession& session, UrlRequest request, std::shared_ptr<Queue> queue)
+    /// A data task; a transfer if there are files.
+    Load(UrlSession& session, UrlRequest request, std::shared_ptr<Queue> queue,
+         std::optional<TransferFiles> files = std::nullopt)
     {
-        task = session.dataTask(
-            std::move(request), [state = _state, queue = std::move(queue)](auto data, auto response, auto error) {
-                if (++state->completions > 1) return;
-                const auto finished = state->task.lock();
-                state->outcome.set_value({std::move(data), std::move(response), std::move(error),
-                                          finished ? finished->timingData() : Value(), queue->isCurrent()});
-            });
+        auto completion = [state = _state, queue = std::move(queue)](auto data, auto response, auto error) {
+            if (++state->completions > 1) return;
+            const auto finished = state->task.lock();
+            state->outcome.set_value({std::move(data), std::move(response), std::move(error),
+                                      finished ? finished->timingData() : Value(), queue->isCurrent()});
+        };
+        task = files ? session.transferTask(std::move(request), std::move(*files), std::move(completion))
+                     : session.dataTask(std::move(request), std::move(completion));
         _state->task = task;
     }
 
