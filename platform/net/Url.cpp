@@ -5,6 +5,7 @@
 #include <memory>
 
 #include <curl/curl.h>
+#include <unicode/uidna.h>
 
 #include "platform/net/UrlScheme.h"
 
@@ -13,15 +14,18 @@ namespace platform {
 namespace {
 
 constexpr std::size_t kMaximumLength = 64u << 10;
+/// An ASCII host name has 253 characters at most; its Unicode form in UTF-8 isn't much longer.
+constexpr std::size_t kMaximumHost = 1024;
+/// Parsing keeps paths as they are (CURLU_PATH_AS_IS in addition); resolving removes dot segments.
+constexpr unsigned kFlags = CURLU_NON_SUPPORT_SCHEME | CURLU_NO_AUTHORITY;
 
 using Handle = std::unique_ptr<CURLU, decltype(&curl_url_cleanup)>;
 
-/// The URL taken apart; null where it is none.
+/// Parses a URL; null if it is invalid.
 Handle parsed(const std::string& text)
 {
     Handle handle(curl_url(), curl_url_cleanup);
-    constexpr unsigned kFlags = CURLU_NON_SUPPORT_SCHEME | CURLU_NO_AUTHORITY | CURLU_PATH_AS_IS;
-    if (!handle || curl_url_set(handle.get(), CURLUPART_URL, text.c_str(), kFlags) != CURLUE_OK)
+    if (!handle || curl_url_set(handle.get(), CURLUPART_URL, text.c_str(), kFlags | CURLU_PATH_AS_IS) != CURLUE_OK)
         return {nullptr, curl_url_cleanup};
     return handle;
 }
@@ -67,7 +71,7 @@ template <class Keep> std::string percentEncode(std::string_view text, Keep keep
     return result;
 }
 
-/// What may stand in a URL as it is, "%" included.
+/// Characters that a URL may have unencoded, and "%".
 bool isUrlCharacter(unsigned char c)
 {
     return isUnreserved(c) || std::string_view(":/?#[]@!$&'()*+,;=%").contains(static_cast<char>(c));
@@ -81,7 +85,7 @@ int hexDigit(char c)
     return -1;
 }
 
-/// The byte that the escape at `at` stands for, or -1 where there is no whole one.
+/// The byte encoded by the escape at `at`; -1 if there is no complete escape.
 int escapedByte(std::string_view text, std::size_t at)
 {
     if (text[at] != '%' || at + 2 >= text.size()) return -1;
@@ -90,7 +94,67 @@ int escapedByte(std::string_view text, std::size_t at)
     return high < 0 || low < 0 ? -1 : high << 4 | low;
 }
 
-/// Encodes each "%" that begins no escape.
+/// Positions in "scheme://user@host:port/path". All are npos for a text without "://".
+struct Authority {
+    std::size_t begin = std::string_view::npos; // after "//"
+    std::size_t host = std::string_view::npos;
+    std::size_t hostEnd = std::string_view::npos;
+};
+
+Authority authorityIn(std::string_view text)
+{
+    const std::size_t mark = text.find("://");
+    if (mark == std::string_view::npos || !isUrlScheme(text.substr(0, mark))) return {};
+    Authority found{.begin = mark + 3};
+    const std::size_t end = std::min(text.find_first_of("/?#", found.begin), text.size());
+    const std::string_view authority = text.substr(found.begin, end - found.begin);
+    const std::size_t at = authority.rfind('@');
+    found.host = at == std::string_view::npos ? found.begin : found.begin + at + 1;
+    // The colons of an IPv6 address are inside brackets.
+    const std::size_t colon =
+        text.find(':', text.substr(found.host).starts_with('[') ? text.find(']', found.host) : found.host);
+    found.hostEnd = std::min(colon, end);
+    return found;
+}
+
+/// The ASCII name of a Unicode host; nullopt if it has none.
+std::optional<std::string> asciiHost(const std::string& host)
+{
+    if (host.size() > kMaximumHost) return std::nullopt;
+    struct Processor {
+        UErrorCode error = U_ZERO_ERROR;
+        UIDNA* idna = uidna_openUTS46(UIDNA_CHECK_BIDI | UIDNA_CHECK_CONTEXTJ | UIDNA_NONTRANSITIONAL_TO_ASCII, &error);
+        ~Processor() { uidna_close(idna); }
+    };
+    static const Processor processor;
+    UErrorCode error = processor.error;
+    UIDNAInfo info = UIDNA_INFO_INITIALIZER;
+    std::string name(kMaximumHost, '\0');
+    const std::int32_t length =
+        uidna_nameToASCII_UTF8(processor.idna, host.data(), static_cast<std::int32_t>(host.size()), name.data(),
+                               static_cast<std::int32_t>(name.size()), &info, &error);
+    if (U_FAILURE(error) || info.errors != 0 || length <= 0) return std::nullopt;
+    name.resize(static_cast<std::size_t>(length));
+    // Compatibility forms may map to delimiters ("℀" to "a/c"), and the host would end there.
+    return std::ranges::all_of(name, isUnreserved) ? std::optional(std::move(name)) : std::nullopt;
+}
+
+/// Replaces a Unicode host, percent-encoded or not, by its ASCII name. Other URLs are returned unchanged; nullopt if
+/// the host has no ASCII name.
+std::optional<std::string> withAsciiHost(std::string_view text)
+{
+    const Authority at = authorityIn(text);
+    if (at.host == std::string_view::npos) return std::string(text);
+    const std::string scheme = lowerCased(std::string(text.substr(0, text.find(':'))));
+    const std::string host = percentDecode(text.substr(at.host, at.hostEnd - at.host));
+    const bool isUnicode = std::ranges::any_of(host, [](unsigned char c) { return c >= 0x80; });
+    if (!isUnicode || (scheme != "http" && scheme != "https")) return std::string(text);
+    const auto name = asciiHost(host);
+    if (!name) return std::nullopt;
+    return std::string(text.substr(0, at.host)) + *name + std::string(text.substr(at.hostEnd));
+}
+
+/// Encodes each "%" that starts no escape.
 std::string withWholeEscapes(std::string_view text)
 {
     std::string result;
@@ -135,13 +199,39 @@ std::optional<Url> Url::parse(std::string_view text)
     const auto isControl = [](unsigned char c) { return c < 0x20 || c == 0x7f; };
     if (text.empty() || text.size() > kMaximumLength || std::ranges::any_of(text, isControl)) return std::nullopt;
 
-    std::string encoded = percentEncode(text, isUrlCharacter);
+    const auto ascii = withAsciiHost(text);
+    if (!ascii) return std::nullopt;
+    std::string encoded = percentEncode(*ascii, isUrlCharacter);
     if (encoded.contains('%')) encoded = withWholeEscapes(encoded);
     const std::size_t colon = encoded.find(':');
     const std::string_view scheme = std::string_view(encoded).substr(0, colon);
     if (colon == std::string::npos || !isUrlScheme(scheme) || encoded.size() > kMaximumLength || !parsed(encoded))
         return std::nullopt;
     return Url(std::move(encoded));
+}
+
+std::optional<Url> Url::resolve(std::string_view reference) const
+{
+    if (const std::size_t mark = reference.find_first_of(":/?#");
+        mark != std::string_view::npos && reference[mark] == ':' && isUrlScheme(reference.substr(0, mark)))
+        return parse(reference);
+    if (reference.starts_with("//")) return parse(scheme() + ":" + std::string(reference));
+    const Handle handle = parsed(_text);
+    const std::string encoded = withWholeEscapes(percentEncode(reference, isUrlCharacter));
+    char* found = nullptr;
+    if (!handle || encoded.size() > kMaximumLength ||
+        curl_url_set(handle.get(), CURLUPART_URL, encoded.c_str(), kFlags) != CURLUE_OK ||
+        curl_url_get(handle.get(), CURLUPART_URL, &found, 0) != CURLUE_OK)
+        return std::nullopt;
+    const std::unique_ptr<char, decltype(&curl_free)> owner(found, curl_free);
+    return parse(found);
+}
+
+Url Url::withoutUserInfo() const
+{
+    const Authority at = authorityIn(_text);
+    if (at.host == at.begin) return *this;
+    return Url(_text.substr(0, at.begin) + _text.substr(at.host));
 }
 
 std::string Url::scheme() const

@@ -5,7 +5,7 @@
 
 namespace platform {
 
-/// Whether a text is the scheme of a URL (RFC 3986, 3.1).
+/// Whether the text has the form of a URL's scheme (RFC 3986, 3.1), without ":".
 [[nodiscard]] inline bool isUrlScheme(std::string_view text)
 {
     const auto isLetter = [](char c) { return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z'); };

@@ -50,6 +50,47 @@ TEST(Url, IsTakenApart)
     }
 }
 
+TEST(Url, HostsInUnicodeBecomeTheirAsciiNames)
+{
+    const std::pair<std::string, std::string> cases[]{
+        {"http://bücher.example/ü", "http://xn--bcher-kva.example/%C3%BC"},
+        {"HTTPS://u@BÜCHER.example:1?ü#ü", "HTTPS://u@xn--bcher-kva.example:1?%C3%BC#%C3%BC"},
+        {"http://b%C3%BCcher.example/", "http://xn--bcher-kva.example/"},
+        {"http://straße.example", "http://xn--strae-oqa.example"},
+        {"http://例え。テスト/", "http://xn--r8jz45g.xn--zckzah/"},
+        {"http://１２７.０.０.１/", "http://127.0.0.1/"},
+        {"http://Plain.example/", "http://Plain.example/"},
+        {"http://under_score.example/", "http://under_score.example/"},
+        {"http://h/ü@b/", "http://h/%C3%BC@b/"},
+        {"http://\xff.example/", ""},
+        {"http://evil.example℀.good.example/", ""},
+        {"http://good.example＠evil.example/", ""},
+        {"http://a\u200b\u200d.example/", ""},
+        {"http://ü" + std::string(2000, 'x') + "/", ""},
+    };
+    for (const auto& [text, url] : cases) EXPECT_EQ(Url::parse(text).value_or(Url()).string(), url) << text;
+}
+
+TEST(Url, ReferencesAreResolved)
+{
+    const Url base = *Url::parse("https://u:p@h.example:8/a/b/c?q=1#f");
+    const std::pair<std::string, std::string> cases[]{
+        {"d", "https://u:p@h.example:8/a/b/d"},
+        {"../d?x", "https://u:p@h.example:8/a/d?x"},
+        {"/d", "https://u:p@h.example:8/d"},
+        {"?r", "https://u:p@h.example:8/a/b/c?r"},
+        {"//o.example/d", "https://o.example/d"},
+        {"http://o.example", "http://o.example"},
+        {"./ü d", "https://u:p@h.example:8/a/b/%C3%BC%20d"},
+        {"//bücher.example/", "https://xn--bcher-kva.example/"},
+        {"javascript:1", ""},
+        {"http://[", ""},
+        {"a:b/c", ""},
+    };
+    for (const auto& [reference, url] : cases)
+        EXPECT_EQ(base.resolve(reference).value_or(Url()).string(), url) << reference;
+}
+
 TEST(Url, WhatAUrlCannotHoldIsEncodedOnce)
 {
     const std::pair<std::string, std::string> cases[]{
