@@ -12,7 +12,7 @@ namespace {
 
 using std::chrono::seconds;
 
-/// About 68 years: what is more counts as so much (RFC 9111, 1.2.2).
+/// About 68 years; larger values count as this one (RFC 9111, 1.2.2).
 constexpr seconds kLongest{std::int64_t{1} << 31};
 
 bool equalIgnoringCase(std::string_view a, std::string_view b)
@@ -27,7 +27,7 @@ std::string_view withoutBlanks(std::string_view text)
     return text.substr(first, text.find_last_not_of(" \t") - first + 1);
 }
 
-/// Calls `each` with the elements of a list; a comma within quotation marks is none.
+/// Calls `each` with the elements of a list. Commas inside quotation marks don't separate.
 template <class Each> void forEachElement(std::string_view list, Each each)
 {
     bool quoted = false;
@@ -56,7 +56,7 @@ std::optional<seconds> deltaSeconds(std::string_view text)
 struct Directives {
     bool noStore = false;
     bool noCache = false;
-    std::optional<seconds> maxAge; // of several the smallest; one that is no number is 0
+    std::optional<seconds> maxAge; // the smallest of several; 0 for one that isn't a number
 };
 
 Directives directivesOf(const HttpHeaders& headers)
@@ -66,7 +66,7 @@ Directives directivesOf(const HttpHeaders& headers)
         const auto equals = element.find('=');
         const std::string_view name = withoutBlanks(element.substr(0, equals));
         if (equalIgnoringCase(name, "no-store")) found.noStore = true;
-        // With field names it would concern these alone; all of the answer may be confirmed instead.
+        // With field names it concerns only those fields; confirming the whole answer is allowed, too.
         if (equalIgnoringCase(name, "no-cache")) found.noCache = true;
         if (!equalIgnoringCase(name, "max-age")) return;
         const std::string_view value = equals == std::string_view::npos ? "" : element.substr(equals + 1);
@@ -86,7 +86,7 @@ Directives requestDirectives(const HttpHeaders& headers)
     return found;
 }
 
-/// Seconds since 1970 in a field of that name.
+/// The date in the field of that name, in seconds since 1970.
 std::optional<seconds> dateIn(const HttpHeaders& headers, std::string_view name)
 {
     const std::string* field = headers.find(name);
@@ -120,7 +120,8 @@ bool equalWeakly(std::string_view a, std::string_view b)
     return a == b;
 }
 
-/// Fields of a connection, and those that say what the kept body is (RFC 9111, 3.1 and 3.2).
+/// Fields that a confirmation doesn't update: those of the connection, and those that describe the stored body
+/// (RFC 9111, 3.1 and 3.2).
 bool keepsItsOwn(std::string_view name)
 {
     constexpr std::array<std::string_view, 13> kNames{"Connection",
@@ -208,12 +209,12 @@ seconds currentAge(const StoredResponse& stored, Date now)
 Reuse reuse(const StoredResponse& stored, const UrlRequest& request, Date now)
 {
     if (selectingFields(stored.response, request) != stored.selecting) return Reuse::None;
-    if (directivesOf(stored.response.headers).noStore) return Reuse::None; // it is here for who stored it
+    if (directivesOf(stored.response.headers).noStore) return Reuse::None; // stored explicitly, not by these rules
     const Directives asked = requestDirectives(request.headers);
     const seconds age = currentAge(stored, now);
     const bool fresh = !asked.noCache && age < freshnessLifetime(stored.response, stored.received) &&
                        age <= asked.maxAge.value_or(kLongest) &&
-                       now >= stored.received; // a clock that was set back tells no age
+                       now >= stored.received; // after the clock was set back the age is unknown
     if (fresh) return Reuse::Answer;
     return hasValidator(stored.response.headers) ? Reuse::Confirm : Reuse::None;
 }
@@ -238,7 +239,7 @@ bool confirms(const UrlResponse& notModified, const StoredResponse& stored)
 StoredResponse confirmed(StoredResponse stored, const UrlResponse& notModified, Date requested, Date received)
 {
     HttpHeaders& headers = stored.response.headers;
-    // An age is of the answer that it came with.
+    // The old answer's age doesn't hold for the confirmation.
     headers.remove("Age");
     for (const auto& [name, value] : notModified.headers)
         if (!keepsItsOwn(name)) headers.remove(name);

@@ -9,61 +9,61 @@
 
 namespace platform {
 
-// What HTTP asks of a cache that serves one user (RFC 9111), as functions of a request, an answer and the time. Times
-// are whole seconds, as they are in header fields. Any thread.
+// The rules of HTTP for a cache of one user (RFC 9111), as pure functions of a request, an answer and the time. Times
+// are whole seconds, as in header fields. Any thread.
 
-/// An answer that a cache keeps. The body is shared with the cache: bytes in memory, or a mapped file.
+/// A cached answer. The body is shared with the cache: bytes in memory, or a mapped file.
 struct CachedResponse {
     UrlResponse response;
     Bytes body;
 };
 
-/// The same with what its reuse depends on.
+/// A cached answer with what its reuse depends on.
 struct StoredResponse : CachedResponse {
-    std::string selecting; ///< what `selectingFields` made of the request that it answered
-    Date requested;        ///< when that was sent, or later confirmed
-    Date received;         ///< when the answer, or its confirmation, came
+    std::string selecting; ///< `selectingFields` of the request that it answered
+    Date requested;        ///< when that request, or the last confirmation, was sent
+    Date received;         ///< when the answer, or the last confirmation, was received
     bool mapped = false;   ///< the body is a mapped file
 };
 
-/// What an answer is kept under: the URL without its fragment.
+/// The key of an answer in a cache: the URL without its fragment.
 [[nodiscard]] std::string cacheKey(const Url& url);
 
-/// What a data task has to do with a cache.
+/// How a data task uses a cache.
 enum class CacheUse {
     None,
-    Fill,       ///< its answer may be kept
-    Ask,        ///< it may be answered from the cache, else the same
-    Invalidate, ///< its success means that what is kept for the URL is no longer true
+    Fill,       ///< its answer may be stored
+    Ask,        ///< a cached answer may be used; otherwise as Fill
+    Invalidate, ///< its success removes what is stored for the URL
 };
-/// Requests with credentials, for a part, with a body or with conditions of their own have nothing to do with it.
+/// How this request uses a cache. None if it has credentials, a range, a body or conditions of its own.
 [[nodiscard]] CacheUse cacheUse(const UrlRequest& request);
 
-/// The request's values of the fields that the answer's Vary names, one line each; nothing for "*", which no request
+/// The request's values of the fields named by the answer's Vary, one line each; nullopt for "*", which no request
 /// matches.
 [[nodiscard]] std::optional<std::string> selectingFields(const UrlResponse& response, const UrlRequest& request);
 
-/// Whether the answer to a request that may fill a cache may be kept, and could ever be used: it is fresh for a time,
-/// or can be confirmed. Only answers of the statuses that are cacheable by default are kept.
+/// Whether an answer may be stored and could be used: it stays fresh for some time, or can be confirmed. Only statuses
+/// that are cacheable by default qualify. The request must be one that may fill a cache.
 [[nodiscard]] bool isStorable(const UrlRequest& request, const UrlResponse& response, Date received);
 
-/// How long an answer is fresh: "max-age", else "Expires", else a tenth of the time since "Last-Modified". None for
-/// one that must be confirmed each time, and for one that says it wrongly.
+/// How long an answer is fresh: "max-age", else "Expires", else a tenth of the time since "Last-Modified". 0 if it must
+/// be confirmed each time, or if those fields can't be parsed.
 [[nodiscard]] std::chrono::seconds freshnessLifetime(const UrlResponse& response, Date received);
 
-/// How long ago the answer left its origin, at least.
+/// The least time since the answer left its origin.
 [[nodiscard]] std::chrono::seconds currentAge(const StoredResponse& stored, Date now);
 
-/// What a kept answer is worth to a request. A stale one is never answered unconfirmed, so "must-revalidate" adds
+/// How a cached answer serves a request. A stale answer is never used unconfirmed, so "must-revalidate" changes
 /// nothing.
 enum class Reuse { Answer, Confirm, None };
 [[nodiscard]] Reuse reuse(const StoredResponse& stored, const UrlRequest& request, Date now);
 
-/// The request, with the condition that the kept answer is no longer true.
+/// The request with conditions that the cached answer's validators have changed.
 [[nodiscard]] UrlRequest confirmationRequest(const StoredResponse& stored, UrlRequest request);
-/// Whether an answer of status 304 is about the kept answer.
+/// Whether an answer of status 304 confirms this cached answer: its ETag, if it has one, matches.
 [[nodiscard]] bool confirms(const UrlResponse& notModified, const StoredResponse& stored);
-/// The kept answer, updated by what the confirmation says.
+/// The cached answer updated with the header fields and times of its confirmation.
 [[nodiscard]] StoredResponse confirmed(StoredResponse stored, const UrlResponse& notModified, Date requested,
                                        Date received);
 

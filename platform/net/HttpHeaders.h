@@ -8,7 +8,7 @@
 
 namespace platform {
 
-/// Header fields in the order in which they stand. Names compare without regard to case (RFC 9110).
+/// Header fields in their order. Names are compared case-insensitively (RFC 9110). A plain value.
 class HttpHeaders {
 public:
     using Entry = std::pair<std::string, std::string>;
@@ -16,13 +16,13 @@ public:
     HttpHeaders() = default;
     HttpHeaders(std::initializer_list<Entry> entries) : _entries(entries) {}
 
-    /// The first field of that name.
+    /// The value of the first field of that name; null if there is none. Valid until the next change.
     [[nodiscard]] const std::string* find(std::string_view name) const;
-    /// The values of all fields of that name, with commas between them: one list (RFC 9110, 5.3).
+    /// The values of all fields of that name, joined by commas into one list (RFC 9110, 5.3).
     [[nodiscard]] std::string list(std::string_view name) const;
-    /// Sets a field in place of every one of that name.
+    /// Replaces all fields of that name by one.
     void set(std::string name, std::string value);
-    /// Adds a field beside those that are there.
+    /// Appends a field, whether or not others have its name.
     void add(std::string name, std::string value) { _entries.emplace_back(std::move(name), std::move(value)); }
     void remove(std::string_view name);
 

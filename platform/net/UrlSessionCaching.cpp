@@ -14,11 +14,11 @@ namespace {
 
 using Stored = std::shared_ptr<const StoredResponse>;
 
-/// Keeps the answer if that may be done.
+/// Stores the answer if HTTP allows it.
 void fill(HttpCache& cache, const UrlRequest& request, const Bytes& data, const UrlResponse& response, Date requested,
           bool hadStored)
 {
-    // After a redirect it is the answer of where that led.
+    // Stored under the URL that answered, which differs from the request's after a redirect.
     const Date received = cache.now();
     if (isStorable(request, response, received)) {
         StoredResponse stored;
@@ -29,11 +29,11 @@ void fill(HttpCache& cache, const UrlRequest& request, const Bytes& data, const 
         stored.received = received;
         cache.store(response.url, std::move(stored));
     } else if (hadStored && response.statusCode < 400) {
-        cache.remove(request.url); // it has been replaced
+        cache.remove(request.url); // the answer replaces it
     }
 }
 
-/// Bytes that depend on no file: nobody knows how long the task's owner, or a confirmation, keeps them.
+/// The answer with its body in memory. A mapped file may change while the task's owner, or a confirmation, still reads.
 Stored inMemory(Stored stored)
 {
     if (!stored->mapped) return stored;
@@ -43,7 +43,7 @@ Stored inMemory(Stored stored)
     return copy;
 }
 
-/// When an answer from the cache was asked for and there.
+/// Timing data of an answer from the cache: its start and its end, now.
 Value timingFromCache(double start)
 {
     const double end = monotonicSeconds();
@@ -55,13 +55,13 @@ Value timingFromCache(double start)
                       {"_kCFNTimingDataResponseEnd", end},     {"_kCFNTimingDataConnectionReused", false}};
 }
 
-/// A task that asks the cache. It ends once, by whoever takes the completion first under the mutex:
+/// A task that looks into the cache. Whoever moves it to Ended under the mutex runs the completion:
 ///
 ///     suspended ──resume──► asking ──nothing, or stale──► loading ──► ended
 ///         └──────cancel──────┴──fresh, or cancel────────────────────────┘
 ///
-/// While it is loading a cancel is the load's affair. An answer that turns out not to confirm what it should is loaded
-/// again, without a condition.
+/// While it is loading, `cancel` cancels the load. A 304 that doesn't match the cached answer is followed by a load
+/// without conditions.
 class CachingTask final : public UrlTask, public std::enable_shared_from_this<CachingTask> {
 public:
     CachingTask(std::shared_ptr<UrlSession> loads, std::shared_ptr<HttpCache> cache,
@@ -69,7 +69,7 @@ public:
         : _loads(std::move(loads)), _cache(std::move(cache)), _delegateQueue(std::move(delegateQueue)),
           _request(std::move(request)), _completion(std::move(completion))
     {}
-    /// Makes the load, whose number is the task's. Once, before anything else.
+    /// Makes the load, whose identifier is the task's. Called once, first.
     void prepare()
     {
         _load = makeLoad(_request);
@@ -112,7 +112,7 @@ private:
 
     [[nodiscard]] std::shared_ptr<UrlTask> makeLoad(UrlRequest request)
     {
-        // Weakly, for a load that is never resumed never lets go of it.
+        // Weak: a load that is never resumed never releases its completion.
         return _loads->dataTask(std::move(request), [weak = weak_from_this()](auto data, auto response, auto error) {
             if (const auto self = weak.lock()) self->loaded(std::move(data), std::move(response), std::move(error));
         });
@@ -128,14 +128,14 @@ private:
         load(_confirming ? makeLoad(confirmationRequest(*_stored, _request)) : nullptr);
     }
 
-    /// Goes over to loading, with the load made before if there is no other.
+    /// Starts `other`, or if null the load that `prepare` made.
     void load(std::shared_ptr<UrlTask> other)
     {
         std::shared_ptr<UrlTask> resumed;
         _requested = _cache->now();
         {
             std::lock_guard lock(_mutex);
-            if (_state == State::Ended || _cancelled) return; // who cancelled it ends it
+            if (_state == State::Ended || _cancelled) return; // `cancel` completes it
             _state = State::Loading;
             if (other) _load = std::move(other);
             _self = shared_from_this();
@@ -144,7 +144,7 @@ private:
         resumed->resume();
     }
 
-    /// On the delegate queue.
+    /// Runs on the delegate queue.
     void loaded(std::optional<Bytes> data, std::optional<UrlResponse> response, std::optional<Error> error)
     {
         std::shared_ptr<UrlTask> finished;
@@ -184,7 +184,7 @@ private:
         load(nullptr);
     }
 
-    /// Ends it at once, on the delegate queue. Only the load does so.
+    /// Completes the task inline. Only called by the load's completion, on the delegate queue.
     void finish(std::optional<Bytes> data, std::optional<UrlResponse> response, std::optional<Error> error,
                 Value timing)
     {
@@ -200,7 +200,7 @@ private:
         completion(std::move(data), std::move(response), std::move(error));
     }
 
-    /// Ends it, if nobody did, in a task of the delegate queue. Not while it is loading.
+    /// Completes the task on the delegate queue, unless it is loading or has ended.
     void end(std::optional<Bytes> data, std::optional<UrlResponse> response, std::optional<Error> error, Value timing)
     {
         {
@@ -222,8 +222,8 @@ private:
     const std::shared_ptr<Queue> _delegateQueue;
     const UrlRequest _request;
     std::uint64_t _identifier = 0;
-    UrlSession::DataCompletion _completion; // whoever ends it
-    double _start = 0;                      // set before the cache is asked, like the next ones before the load
+    UrlSession::DataCompletion _completion; // used by whoever ends the task
+    double _start = 0;                      // these four are set before the step that reads them
     Stored _stored;
     bool _confirming = false;
     Date _requested;

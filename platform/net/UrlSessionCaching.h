@@ -6,12 +6,11 @@
 
 namespace platform {
 
-/// A session whose data tasks ask `cache` first and fill it, by the rules of HTTP; what it doesn't have, or must have
-/// confirmed, is loaded by `loads`, whose delegate queue must be the same. Transfer tasks go to `loads` as they are.
+/// Makes a session whose data tasks look into `cache` first and fill it, by the rules of HTTP. What isn't cached, or
+/// must be confirmed, is loaded by `loads`, which must have the same delegate queue. Transfer tasks go to `loads`.
 ///
-/// A load's answer is in the cache before the task's completion runs. Bodies from the cache are copies in memory, which
-/// no change of its files reaches. A task that asks the cache can be cancelled at
-/// any time like others. Timing data of an answer from the cache has the marks of its begin and end only. Any thread.
+/// An answer is in the cache before the task's completion runs. Bodies from the cache are copies in memory: no change
+/// of the cache's files reaches them. Timing data of an answer from the cache has only its start and end. Any thread.
 [[nodiscard]] std::shared_ptr<UrlSession> makeCachingSession(std::shared_ptr<UrlSession> loads,
                                                              std::shared_ptr<HttpCache> cache,
                                                              std::shared_ptr<Queue> delegateQueue);
