@@ -42,7 +42,8 @@ platform::UrlSessionConfiguration foregroundConfiguration(const platform::Device
 {
     return {.allowFastOpenAndTickets = !device.userDefaults.boolean("TAVNoParallax"),
             .pipelining = true,
-            .connectionPurgeTimeout = 10s,
+            .meteredPurgeTimeout = 10s,
+            .network = &device.network,
             .caFile = caFile(),
             .cache = platform::HttpCacheConfiguration{.memoryCapacity = 1u << 20,
                                                       .diskCapacity = 100u << 20,
@@ -83,8 +84,9 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device)
         {.identifier = "com.quorvane.tavrind", .allowsMetered = false, .resourceTimeout = 24h, .caFile = caFile()},
         assembly.downloadManager, device.serialQueue("com.quorvane.tavrind.downloadSession"));
     assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.launch");
-    assembly.bagSession = device.urlLoader.makeSession({.connectionPurgeTimeout = 10s, .caFile = caFile()},
-                                                       sessionQueue("com.quorvane.tavrind.bagSession"));
+    assembly.bagSession =
+        device.urlLoader.makeSession({.meteredPurgeTimeout = 10s, .network = &device.network, .caFile = caFile()},
+                                     sessionQueue("com.quorvane.tavrind.bagSession"));
     assembly.uploadURLSession = device.backgroundSessions.make(
         {.identifier = "com.quorvane.tavrind.flusher.nsurlsession",
          .requestTimeout = 300s,

@@ -133,6 +133,7 @@ public:
           _answers(Queue::make(_configuration.identifier + ".tasks", Queue::Kind::Concurrent, environment.executor,
                                environment.clock)),
           _loads(environment.loader.makeSession({.requestTimeout = _configuration.requestTimeout,
+                                                 .totalTimeout = _configuration.resourceTimeout,
                                                  .maximumResponseSize = _configuration.maximumResponseSize,
                                                  .caFile = _configuration.caFile},
                                                 _queue)),

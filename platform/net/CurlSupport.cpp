@@ -9,6 +9,7 @@
 #include <memory>
 #include <netinet/in.h>
 
+#include "platform/net/NetworkStatus.h"
 #include "platform/net/UrlSession.h"
 #include "platform/values/Dictionary.h"
 
@@ -49,39 +50,11 @@ Error urlErrorFromCurl(CURLcode code, const char* detail)
     return urlError(mapped(), std::move(reason));
 }
 
-namespace {
-
-/// Where an IPv6 address holds the IPv4 address that it stands for: mapped, compatible, behind NAT64 (RFC 6052) or
-/// 6to4 (RFC 3056); null for others.
-const unsigned char* embeddedIPv4(const in6_addr& v6)
+std::optional<Duration> connectionPurgeTimeout(const UrlSessionConfiguration& configuration)
 {
-    constexpr unsigned char kNat64[12]{0, 0x64, 0xff, 0x9b};
-    if (IN6_IS_ADDR_V4MAPPED(&v6) || IN6_IS_ADDR_V4COMPAT(&v6) || std::memcmp(v6.s6_addr, kNat64, sizeof kNat64) == 0)
-        return v6.s6_addr + 12;
-    return v6.s6_addr[0] == 0x20 && v6.s6_addr[1] == 0x02 ? v6.s6_addr + 2 : nullptr;
-}
-
-} // namespace
-
-bool isPublicAddress(const std::string& address)
-{
-    in_addr v4{};
-    in6_addr v6{};
-    if (inet_pton(AF_INET6, address.c_str(), &v6) == 1) {
-        const unsigned char* embedded = embeddedIPv4(v6);
-        if (!embedded) {
-            const bool uniqueLocal = (v6.s6_addr[0] & 0xfe) == 0xfc;
-            return !(IN6_IS_ADDR_LOOPBACK(&v6) || IN6_IS_ADDR_UNSPECIFIED(&v6) || IN6_IS_ADDR_LINKLOCAL(&v6) ||
-                     uniqueLocal);
-        }
-        std::memcpy(&v4, embedded, sizeof v4);
-    } else if (inet_pton(AF_INET, address.c_str(), &v4) != 1) {
-        return false;
-    }
-    const std::uint32_t a = ntohl(v4.s_addr);
-    const auto within = [a](std::uint32_t network, int bits) { return (a ^ network) >> (32 - bits) == 0; };
-    return !(within(0x7f000000, 8) || within(0x0a000000, 8) || within(0xac100000, 12) || within(0xc0a80000, 16) ||
-             within(0xa9fe0000, 16) || within(0x64400000, 10) || within(0x00000000, 8));
+    if (!configuration.meteredPurgeTimeout || !configuration.network) return std::nullopt;
+    const auto state = configuration.network->current();
+    return state && state->metered ? configuration.meteredPurgeTimeout : std::nullopt;
 }
 
 std::string socketAddress(const std::string& ip, long port)
@@ -120,7 +93,7 @@ double seconds(CURL* easy, CURLINFO info)
     return static_cast<double>(microseconds) / 1e6;
 }
 
-/// The name of the interface that has this address now.
+/// The name of the network interface with this address; empty if none has it.
 std::string readInterfaceOf(const std::string& localIp)
 {
     ifaddrs* list = nullptr;
@@ -141,7 +114,7 @@ std::string readInterfaceOf(const std::string& localIp)
     return {};
 }
 
-/// The same, as of 10 s ago at most: listing a device's interfaces takes longer than parsing an answer.
+/// The same, cached for 10 s: listing a device's interfaces takes longer than parsing an answer.
 std::string interfaceOf(const std::string& localIp)
 {
     constexpr double kTrustedFor = 10;
@@ -157,50 +130,38 @@ std::string interfaceOf(const std::string& localIp)
 
 } // namespace
 
-TransferMarks transferMarks(CURL* easy)
-{
-    long connections = 0;
-    curl_easy_getinfo(easy, CURLINFO_NUM_CONNECTS, &connections);
-    return {.lookup = seconds(easy, CURLINFO_NAMELOOKUP_TIME_T),
-            .connected = seconds(easy, CURLINFO_CONNECT_TIME_T),
-            .secured = seconds(easy, CURLINFO_APPCONNECT_TIME_T),
-            .ready = seconds(easy, CURLINFO_PRETRANSFER_TIME_T),
-            .firstByte = seconds(easy, CURLINFO_STARTTRANSFER_TIME_T),
-            .connections = connections};
-}
-
-Value timingDataOf(CURL* easy, double start, const TransferMarks& earlierHops)
+Value timingDataOf(CURL* easy, const LoadMarks& marks)
 {
     const auto text = [&](CURLINFO info) {
         char* value = nullptr;
         curl_easy_getinfo(easy, info, &value);
         return std::string(value ? value : "");
     };
-    const TransferMarks marks = transferMarks(easy);
-    const double redirects = seconds(easy, CURLINFO_REDIRECT_TIME_T);
-    const double total = seconds(easy, CURLINFO_TOTAL_TIME_T);
-    long port = 0;
-    curl_easy_getinfo(easy, CURLINFO_PRIMARY_PORT, &port);
-    const bool reused = marks.connections == earlierHops.connections && marks.ready > earlierHops.ready;
-
-    // 0 is a stage that didn't happen. One that wasn't needed is as old as the one before.
-    const auto at = [&](double TransferMarks::* mark, bool happened = true) {
-        const double offset = marks.*mark - earlierHops.*mark;
-        return happened && offset > 0 ? start + redirects + offset : 0.0;
+    // 0 means that the stage didn't happen.
+    const auto at = [&](CURLINFO info, bool happened = true) {
+        const double offset = seconds(easy, info);
+        return happened && offset > 0 ? marks.hop + offset : 0.0;
     };
-    const double connected = at(&TransferMarks::connected, !reused);
-    const double secured = at(&TransferMarks::secured, !reused);
-    Dictionary timing{{"_kCFNTimingDataFetchStart", start},
-                      {"_kCFNTimingDataRedirectStart", redirects > 0 ? start : 0.0},
-                      {"_kCFNTimingDataRedirectEnd", redirects > 0 ? start + redirects : 0.0},
-                      {"_kCFNTimingDataDomainLookupStart", reused ? 0.0 : start + redirects},
-                      {"_kCFNTimingDataDomainLookupEnd", at(&TransferMarks::lookup, !reused)},
-                      {"_kCFNTimingDataConnectStart", at(&TransferMarks::lookup, !reused)},
+    long port = 0;
+    long connectionsMade = 0;
+    curl_easy_getinfo(easy, CURLINFO_PRIMARY_PORT, &port);
+    curl_easy_getinfo(easy, CURLINFO_NUM_CONNECTS, &connectionsMade);
+    const double requested = at(CURLINFO_PRETRANSFER_TIME_T);
+    const bool reused = connectionsMade == 0 && requested > 0;
+    const double lookedUp = at(CURLINFO_NAMELOOKUP_TIME_T, !reused);
+    const double connected = at(CURLINFO_CONNECT_TIME_T, !reused);
+    const double secured = at(CURLINFO_APPCONNECT_TIME_T, !reused);
+    Dictionary timing{{"_kCFNTimingDataFetchStart", marks.start},
+                      {"_kCFNTimingDataRedirectStart", marks.redirectEnd > 0 ? marks.start : 0.0},
+                      {"_kCFNTimingDataRedirectEnd", marks.redirectEnd},
+                      {"_kCFNTimingDataDomainLookupStart", reused ? 0.0 : marks.hop},
+                      {"_kCFNTimingDataDomainLookupEnd", lookedUp},
+                      {"_kCFNTimingDataConnectStart", lookedUp},
                       {"_kCFNTimingDataConnectEnd", std::max(connected, secured)},
                       {"_kCFNTimingDataSecureConnectionStart", secured > 0 ? connected : 0.0},
-                      {"_kCFNTimingDataRequestStart", at(&TransferMarks::ready)},
-                      {"_kCFNTimingDataResponseStart", at(&TransferMarks::firstByte)},
-                      {"_kCFNTimingDataResponseEnd", start + total},
+                      {"_kCFNTimingDataRequestStart", requested},
+                      {"_kCFNTimingDataResponseStart", at(CURLINFO_STARTTRANSFER_TIME_T)},
+                      {"_kCFNTimingDataResponseEnd", marks.hop + seconds(easy, CURLINFO_TOTAL_TIME_T)},
                       {"_kCFNTimingDataConnectionReused", reused}};
     if (std::string name = interfaceOf(text(CURLINFO_LOCAL_IP)); !name.empty())
         timing.set("_kCFNTimingDataConnectionInterfaceIdentifier", std::move(name));

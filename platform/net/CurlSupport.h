@@ -1,41 +1,38 @@
 #pragma once
 
+#include <optional>
 #include <string>
 
 #include <curl/curl.h>
 
+#include "platform/base/Date.h"
 #include "platform/values/Error.h"
 
 namespace platform {
 
-/// Error in kUrlErrorDomain.
+struct UrlSessionConfiguration;
+
+/// Makes an error in kUrlErrorDomain.
 [[nodiscard]] Error urlError(std::int64_t code, std::string reason);
-/// libcurl's result as such an error; `detail` is its error text, if it left one.
+/// Maps libcurl's result to an error in kUrlErrorDomain. `detail` is libcurl's error text; null or empty if none.
 [[nodiscard]] Error urlErrorFromCurl(CURLcode code, const char* detail);
 
-/// False for loopback, link-local and private addresses (RFC 1918, 4193, 6598) in text form, also where an IPv6 address
-/// stands for such an IPv4 one, and for texts that are none.
-[[nodiscard]] bool isPublicAddress(const std::string& address);
+/// How long a connection may be idle and still be reused, in the network's present state; nullopt is libcurl's default.
+[[nodiscard]] std::optional<Duration> connectionPurgeTimeout(const UrlSessionConfiguration& configuration);
 
-/// A peer's address in the byte form that timing data has (docs/timing.md); empty for text that is no address.
+/// A peer's address in the binary form of timing data (docs/timing.md); empty if `ip` isn't an IP address.
 [[nodiscard]] std::string socketAddress(const std::string& ip, long port);
 
-/// Seconds on the monotonic clock, the loader's clock.
+/// Seconds of the monotonic clock.
 [[nodiscard]] double monotonicSeconds();
-/// libcurl's marks of a transfer: seconds from the start of a hop to the end of a stage, summed over the hops. The
-/// connections made are counted.
-struct TransferMarks {
-    double lookup = 0;
-    double connected = 0;
-    double secured = 0;
-    double ready = 0;
-    double firstByte = 0;
-    long connections = 0;
-};
-[[nodiscard]] TransferMarks transferMarks(CURL* easy);
 
-/// When the stages of a finished transfer's last hop began and ended; docs/timing.md lists the keys. `start` is when
-/// the transfer was begun, `earlierHops` what the marks were before the last hop.
-[[nodiscard]] Value timingDataOf(CURL* easy, double start, const TransferMarks& earlierHops);
+/// When parts of a load began, in `monotonicSeconds`.
+struct LoadMarks {
+    double start = 0;
+    double redirectEnd = 0; ///< 0 if there was no redirect
+    double hop = 0;         ///< the last request: after redirects, and after one lost on a dead connection
+};
+/// The timing data of a finished load; docs/timing.md lists the keys. `easy` must be the handle of its last request.
+[[nodiscard]] Value timingDataOf(CURL* easy, const LoadMarks& marks);
 
 } // namespace platform

@@ -23,7 +23,16 @@ namespace platform {
 class Clock;
 class FileSystem;
 class HttpCache;
+class NetworkStatus;
 class Queue;
+
+/// Describes the answer that named a URL. The URLs of an answer may lead no further than its redirects: never from
+/// https to http, and never from a public host to an address that isn't public.
+struct UrlSource {
+    bool secure = false;   ///< it came over https
+    bool isPublic = false; ///< it came from a public address
+    friend bool operator==(const UrlSource&, const UrlSource&) = default;
+};
 
 /// What to load. A plain value.
 struct UrlRequest {
@@ -31,23 +40,29 @@ struct UrlRequest {
     std::string method = "GET";
     HttpHeaders headers;
     Bytes body;
-    /// The longest the request may go without receiving anything; none is the session's.
+    /// The longest time without a received byte; nullopt is the session's `requestTimeout`.
     std::optional<Duration> timeout;
-    /// Bytes of the answer's body, unpacked; none is the session's limit. More is kUrlTooLarge.
+    /// Limit of the answer's body in bytes, decoded; nullopt is the session's limit. A larger body fails the load with
+    /// kUrlTooLarge.
     std::optional<std::size_t> maximumResponseSize = std::nullopt;
-    /// ReloadIgnoringCache neither answers from a cache nor asks it for validators.
+    /// ReloadIgnoringCache uses neither cached answers nor their validators. The answer may still be stored.
     enum class CachePolicy { Protocol, ReloadIgnoringCache } cachePolicy = CachePolicy::Protocol;
+    /// Set if the URL was named by an answer: `sourceOf` that answer (UrlRedirect.h). It limits where the URL may lead,
+    /// and user information in the URL is not sent.
+    std::optional<UrlSource> source = std::nullopt;
 };
 
-/// What came back. An answer to a URL that isn't http or https has no status and `isHttp` false.
+/// The head of an answer. An answer to a URL other than http and https has no status, and `isHttp` is false.
 struct UrlResponse {
     Url url; ///< where the answer came from, after redirects
     bool isHttp = true;
     int statusCode = 0;
     HttpHeaders headers;
+    /// True if any host of the redirect chain had a public address; nullopt if unknown (an answer read from disk).
+    std::optional<bool> publicPeer = std::nullopt;
 };
 
-/// Errors of URL loading: domain kUrlErrorDomain, codes below, the reason in words.
+/// Errors of URL loading have the domain kUrlErrorDomain, a code below and a reason in words.
 inline constexpr std::string_view kUrlErrorDomain = "UrlErrorDomain";
 enum UrlErrorCode : std::int64_t {
     kUrlCancelled = -999,
@@ -62,13 +77,14 @@ enum UrlErrorCode : std::int64_t {
     kUrlBadResponse = -1011,
     kUrlTooLarge = -1103,
     kUrlTlsFailed = -1200,
-    kUrlForbiddenRedirect = -1201, ///< to another scheme, or from a public host to a private address
+    kUrlForbiddenRedirect =
+        -1201, ///< to another scheme, to an address that isn't public, or with a body to another host
 };
 
-/// One load. Made suspended; nothing happens before `resume()`. Any thread.
+/// One load. It is created suspended; nothing happens before `resume()`. Any thread.
 ///
-/// A task ends exactly once, in its completion; `cancel` ends it with kUrlCancelled. A resumed task keeps itself alive
-/// until then; one that is dropped without `resume()` never completes.
+/// A resumed task calls its completion exactly once; `cancel` completes it with kUrlCancelled. It keeps itself alive
+/// until then. A task that is dropped without `resume()` never completes.
 class UrlTask {
 public:
     virtual ~UrlTask() = default;
@@ -77,72 +93,84 @@ public:
     /// Identifies the task within its session, from 1.
     [[nodiscard]] virtual std::uint64_t identifier() const = 0;
     [[nodiscard]] virtual const UrlRequest& originalRequest() const = 0;
-    /// When the stages of the load began and ended, in seconds on the loader's clock, and the peer's address; a
-    /// dictionary whose keys begin with "_kCFNTimingData" (docs/timing.md), null before the completion.
+    /// When the stages of the load began and ended (seconds of the monotonic clock) and the peer's address: a
+    /// dictionary whose keys begin with "_kCFNTimingData" (docs/timing.md). Null before the completion.
     [[nodiscard]] virtual Value timingData() const = 0;
 };
 
-/// Files in place of the bodies in memory, for loads of any size.
+/// Files that replace bodies in memory, for loads of any size.
 struct TransferFiles {
-    FileHandle upload;   ///< sent whole, from its start, as the request's body; none: the request's own
-    FileHandle download; ///< an empty file that takes the answer's body; none: the body is counted and dropped
-    /// Is told how many bytes of an upload have left, on the loader's thread: it must only hand work on.
+    FileHandle upload;   ///< the request's body, sent whole from its start; if closed, `UrlRequest::body` is sent
+    FileHandle download; ///< an empty file for the answer's body; if closed, the body is counted and dropped
+    /// Called with the bytes of the upload sent so far. Runs on the loader's thread, so it must only hand work on.
     std::function<void(std::uint64_t sent, std::uint64_t expected)> progress;
 };
 
 /// Loads URLs. Any thread.
+///
+/// - A request lost on a reused connection before any byte of its answer is sent once more, on a new connection.
+/// - Redirects follow the rules of UrlRedirect.h.
+/// - An answer whose body ends before its content coding does is an error.
 class UrlSession {
 public:
-    /// data: the body, none with a transport error. response: none where none came. error: a transport error; an HTTP
-    /// error status is none.
+    /// data: the body; nullopt if there is an error. response: nullopt if no answer came. error: a transport error. An
+    /// HTTP error status is not an error.
     using DataCompletion = std::move_only_function<void(std::optional<Bytes> data, std::optional<UrlResponse> response,
                                                         std::optional<Error> error)>;
 
     virtual ~UrlSession() = default;
     /// `completion` runs on the session's delegate queue.
     [[nodiscard]] virtual std::shared_ptr<UrlTask> dataTask(UrlRequest request, DataCompletion completion) = 0;
-    /// The same with bodies in files; the completion's data is empty. Sending counts as progress like receiving. A file
-    /// that can't be read or written is an error of the load, in kPosixErrorDomain.
+    /// Like a data task, with bodies in files; the completion's data is empty. Sent bytes count as progress like
+    /// received ones. A file that can't be read or written fails the load with an error in kPosixErrorDomain. For an
+    /// upload without a download file, a final status is the whole answer, even if it arrives before the body is sent
+    /// or the connection fails after it.
     [[nodiscard]] virtual std::shared_ptr<UrlTask> transferTask(UrlRequest request, TransferFiles files,
                                                                 DataCompletion completion) = 0;
-    /// What the session keeps of its answers; null where it keeps none.
+    /// The session's cache; null if it has none.
     [[nodiscard]] virtual std::shared_ptr<HttpCache> cache() const { return nullptr; }
 };
 
-/// What a session may keep of its answers, and where.
+/// Size and place of a session's cache.
 struct HttpCacheConfiguration {
     std::size_t memoryCapacity = 1u << 20;   ///< bytes
     std::uint64_t diskCapacity = 100u << 20; ///< bytes
-    std::size_t minimumMappedSize = 16384;   ///< bodies of so many bytes are files of their own, mapped when read
-    std::filesystem::path directory;         ///< made with the first need; empty: nothing is kept on disk
+    std::size_t minimumMappedSize = 16384;   ///< bodies of this size and more are separate files, mapped when read
+    std::filesystem::path directory;         ///< created when first needed; empty: nothing is stored on disk
     FileSystem* files = nullptr;             ///< outlives the cache; null only without a directory
-    std::shared_ptr<Queue> queue;            ///< a serial one for the disk's work; null only without a directory
+    std::shared_ptr<Queue> queue;            ///< a serial queue for disk work; null only without a directory
     Clock* clock = nullptr;                  ///< outlives the cache
 };
 
-/// How a session loads.
+/// Options of a session.
 struct UrlSessionConfiguration {
-    /// Without anything received for this long a request times out; a transfer, without anything sent either.
+    /// A data task times out after this time without a received byte; a transfer, without a received or sent byte.
     Duration requestTimeout = std::chrono::seconds(60);
+    /// Limit of a load's whole duration, redirects included. It ends loads that keep receiving a byte at a time.
+    Duration totalTimeout = std::chrono::minutes(5);
     /// TCP Fast Open and TLS session tickets.
     bool allowFastOpenAndTickets = false;
-    bool pipelining = false; ///< wait for a connection that may be multiplexed rather than open another
-    /// Idle connections older than this aren't used again; none is curl's default (118 s).
-    std::optional<Duration> connectionPurgeTimeout;
-    /// Bytes of a body, unpacked. Header fields may take 256 KiB in all. More is kUrlTooLarge.
-    std::size_t maximumResponseSize = 64u << 20;
+    /// Transfers over https wait for a connection that may multiplex instead of opening another.
+    bool pipelining = false;
+    /// While `network` is metered, connections idle for longer than this aren't reused: keeping them open costs.
+    /// Otherwise, or if nullopt, libcurl's default applies (118 s).
+    std::optional<Duration> meteredPurgeTimeout;
+    NetworkStatus* network = nullptr; ///< outlives the loader
+    /// Limit of a body in bytes, encoded and decoded. Header fields have 256 KiB in all. A larger answer fails the load
+    /// with kUrlTooLarge.
+    std::size_t maximumResponseSize = 8u << 20;
     unsigned maximumRedirects = 16;
-    /// A PEM file of certification authorities in place of the system's; empty is the system's.
+    /// A PEM file of certification authorities that replaces the system's; empty: the system's.
     std::string caFile;
-    /// What is kept of answers to data tasks; none is nothing.
+    /// The cache of data tasks; nullopt: none.
     std::optional<HttpCacheConfiguration> cache;
 };
 
-/// Makes sessions. One for the process; a twin in tests/support answers by hand. Any thread.
+/// Makes sessions. There is one for the process. Any thread.
 class UrlLoader {
 public:
     virtual ~UrlLoader() = default;
-    /// A foreground session. `delegateQueue` runs the completions.
+    /// Makes a foreground session whose completions run on `delegateQueue`.
     [[nodiscard]] virtual std::shared_ptr<UrlSession> makeSession(UrlSessionConfiguration configuration,
                                                                   std::shared_ptr<Queue> delegateQueue) = 0;
 };

@@ -6,8 +6,8 @@
 
 namespace platform {
 
-/// The URL-loading thread: one libcurl multi handle that all sessions share. The thread is made with the first task.
-/// Destroying the loader cancels what is under way and joins the thread; its sessions must not be used afterwards.
+/// Makes the loader: one libcurl multi handle, shared by all its sessions, on a thread of its own that starts with the
+/// first task. Destroying the loader cancels all tasks and joins the thread; its sessions must not be used afterwards.
 [[nodiscard]] std::unique_ptr<UrlLoader> makeCurlLoader();
 
 } // namespace platform

@@ -4,6 +4,7 @@
 #include <barrier>
 #include <chrono>
 #include <cstdlib>
+#include <filesystem>
 #include <future>
 #include <memory>
 #include <optional>
@@ -19,6 +20,7 @@
 #include "platform/run/Queue.h"
 #include "platform/run/WorkerPool.h"
 #include "tests/support/ManualClock.h"
+#include "tools/shared/Certificate.h"
 
 namespace platform::test {
 
@@ -105,6 +107,11 @@ struct UrlLoads : testing::Test {
     Outcome load(const Url& url, const UrlSessionConfiguration& configuration = {})
     {
         return load(UrlRequest{.url = url}, configuration);
+    }
+    /// A certificate for servers on loopback, made in `directory`; its file is what clients must trust.
+    static tavrin::tools::CertificateFiles certificateIn(const std::filesystem::path& directory)
+    {
+        return tavrin::tools::provideCertificate(directory, "127.0.0.1", std::chrono::system_clock::now()).value();
     }
     /// Lets every completion that is due run.
     void settle()

@@ -1,0 +1,105 @@
+#include "platform/net/ContentCoding.h"
+
+#include <algorithm>
+#include <array>
+#include <strings.h>
+
+namespace platform {
+
+namespace {
+
+/// Nobody applies more; each costs 40 KiB.
+constexpr std::size_t kMaximumStages = 4;
+
+bool isCoding(std::string_view text, std::string_view name)
+{
+    return text.size() == name.size() && strncasecmp(text.data(), name.data(), name.size()) == 0;
+}
+
+unsigned byteAt(const std::string& text, std::size_t at)
+{
+    return static_cast<unsigned char>(text[at]);
+}
+
+} // namespace
+
+ContentDecoder::ContentDecoder(std::string_view codings)
+{
+    while (!codings.empty() && _stages.size() < kMaximumStages) {
+        std::string_view coding = codings.substr(0, codings.find(','));
+        codings.remove_prefix(std::min(coding.size() + 1, codings.size()));
+        while (coding.starts_with(' ') || coding.starts_with('\t')) coding.remove_prefix(1);
+        while (coding.ends_with(' ') || coding.ends_with('\t')) coding.remove_suffix(1);
+        const bool gzip = isCoding(coding, "gzip") || isCoding(coding, "x-gzip");
+        if (gzip || isCoding(coding, "deflate")) _stages.emplace_front(gzip);
+    }
+}
+
+bool ContentDecoder::feed(std::string_view bytes, const Sink& sink)
+{
+    return feed(_stages.begin(), bytes, sink);
+}
+
+bool ContentDecoder::feed(std::list<Stage>::iterator stage, std::string_view bytes, const Sink& sink)
+{
+    if (stage == _stages.end()) return sink(bytes);
+    const auto next = std::next(stage);
+    if (next == _stages.end()) return stage->feed(bytes, sink);
+    return stage->feed(bytes, [&](std::string_view decoded) { return feed(next, decoded, sink); });
+}
+
+bool ContentDecoder::finished() const
+{
+    return std::ranges::all_of(_stages, &Stage::finished);
+}
+
+/// Decides by the first two bytes what follows, and prepares zlib for it.
+bool ContentDecoder::Stage::begin()
+{
+    const bool gzipMember = _start == "\x1f\x8b";
+    if (_anyEnded && !gzipMember) {
+        _state = State::Behind;
+        return true;
+    }
+    const bool zlibHeader =
+        (byteAt(_start, 0) & 15) == Z_DEFLATED && (byteAt(_start, 0) * 256 + byteAt(_start, 1)) % 31 == 0;
+    const int window = _gzip ? MAX_WBITS + 16 : zlibHeader ? MAX_WBITS : -MAX_WBITS;
+    _state = State::Inside;
+    return (_anyEnded ? inflateReset(&_stream) : inflateInit2(&_stream, window)) == Z_OK;
+}
+
+bool ContentDecoder::Stage::feed(std::string_view bytes, const Sink& sink)
+{
+    std::array<char, 16 * 1024> decoded;
+    while (!bytes.empty() && _state != State::Behind) {
+        std::string_view input = bytes;
+        if (_state == State::Before) {
+            _start.push_back(bytes.front());
+            bytes.remove_prefix(1);
+            if (_start.size() < 2) continue;
+            if (!begin()) return false;
+            if (_state == State::Behind) break;
+            input = _start;
+        }
+        _stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(input.data()));
+        _stream.avail_in = static_cast<uInt>(input.size());
+        int result = Z_OK;
+        do {
+            _stream.next_out = reinterpret_cast<Bytef*>(decoded.data());
+            _stream.avail_out = decoded.size();
+            result = inflate(&_stream, Z_NO_FLUSH);
+            if (result != Z_OK && result != Z_STREAM_END && result != Z_BUF_ERROR) return false;
+            const std::size_t size = decoded.size() - _stream.avail_out;
+            if (size > 0 && !sink({decoded.data(), size})) return false;
+        } while (result == Z_OK && _stream.avail_out == 0);
+        if (input.data() == bytes.data()) bytes.remove_prefix(bytes.size() - _stream.avail_in);
+        _start.clear();
+        if (result == Z_STREAM_END) {
+            _anyEnded = true;
+            _state = _gzip ? State::Before : State::Behind;
+        }
+    }
+    return true;
+}
+
+} // namespace platform

@@ -1,0 +1,385 @@
+#include "platform/net/CurlLoad.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <sys/stat.h>
+#include <unistd.h>
+#include <utility>
+
+#include <fmt/format.h>
+#include <openssl/ssl.h>
+
+#include "platform/net/UrlRedirect.h"
+
+namespace platform {
+
+namespace {
+
+/// Of one load, over all its hops. libcurl refuses a single line beyond 100 KiB.
+constexpr std::size_t kMaximumHeaderSize = 256u << 10;
+/// Of all bodies in memory that are not yet whole.
+constexpr std::size_t kMaximumInMemory = 64u << 20;
+
+} // namespace
+
+CurlLoad::CurlLoad(const UrlRequest& request, const UrlSessionConfiguration& configuration, const TransferFiles* files,
+                   std::size_t& inMemory)
+    : _request(request), _configuration(configuration), _files(files), _inMemory(inMemory), _hop(request)
+{
+    if (auto allowed = withinSource(request))
+        _hop = std::move(*allowed);
+    else
+        _error = std::move(allowed.error());
+}
+
+CurlLoad::~CurlLoad()
+{
+    _inMemory -= _body.size();
+    curl_slist_free_all(_headerList);
+}
+
+std::size_t CurlLoad::maximumSize() const
+{
+    return _request.maximumResponseSize.value_or(_configuration.maximumResponseSize);
+}
+
+int CurlLoad::status() const
+{
+    long status = 0;
+    if (_easy) curl_easy_getinfo(_easy, CURLINFO_RESPONSE_CODE, &status);
+    return static_cast<int>(status);
+}
+
+CurlLoad::TimePoint CurlLoad::deadline() const
+{
+    return std::min(_lastProgress + timeout(), *_began + _configuration.totalTimeout);
+}
+
+void CurlLoad::timeOut(TimePoint now)
+{
+    _error = now >= *_began + _configuration.totalTimeout
+                 ? urlError(kUrlTimedOut, fmt::format("not whole after {:g} s", toSeconds(_configuration.totalTimeout)))
+                 : urlError(kUrlTimedOut, fmt::format("nothing received for {:g} s", toSeconds(timeout())));
+}
+
+// ---- sending ----
+
+bool CurlLoad::prepare(CURL* easy)
+{
+    const auto now = std::chrono::steady_clock::now();
+    _lastProgress = now;
+    if (!_began) {
+        _began = now;
+        _marks.start = monotonicSeconds();
+    }
+    _easy = easy;
+    _marks.hop = monotonicSeconds();
+    _sent = _anyHeader = _headersEnded = false;
+    _headers = {};
+    _uploaded = 0;
+    curl_slist_free_all(std::exchange(_headerList, nullptr));
+    if (!forgetBody() || _error) return false;
+
+    setOptions();
+    const bool hasBody = hasUpload() || !_hop.body.empty() || _hop.method == "POST";
+    setHeaders(hasBody);
+    if (hasBody) {
+        curl_easy_setopt(easy, CURLOPT_POST, 1L);
+        if (hasUpload()) {
+            if (!setUpload()) return false;
+        } else {
+            curl_easy_setopt(easy, CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(_hop.body.size()));
+            curl_easy_setopt(easy, CURLOPT_POSTFIELDS, _hop.body.empty() ? "" : _hop.body.data());
+        }
+    }
+    if (_hop.method == "HEAD")
+        curl_easy_setopt(easy, CURLOPT_NOBODY, 1L);
+    else if (_hop.method != (hasBody ? "POST" : "GET"))
+        curl_easy_setopt(easy, CURLOPT_CUSTOMREQUEST, _hop.method.c_str());
+    return curl_easy_setopt(easy, CURLOPT_URL, _hop.url.string().c_str()) == CURLE_OK;
+}
+
+void CurlLoad::setOptions()
+{
+    const auto set = [this](CURLoption option, auto value) { curl_easy_setopt(_easy, option, value); };
+    set(CURLOPT_ERRORBUFFER, _errorText.data());
+    set(CURLOPT_NOSIGNAL, 1L);
+    set(CURLOPT_PROTOCOLS_STR, "http,https");
+    set(CURLOPT_HTTP_VERSION, static_cast<long>(CURL_HTTP_VERSION_2TLS));
+    // Over plain HTTP it would hold every request back until the first one is answered.
+    set(CURLOPT_PIPEWAIT, _configuration.pipelining && _files && _hop.url.scheme() == "https" ? 1L : 0L);
+    set(CURLOPT_FRESH_CONNECT, _fresh ? 1L : 0L);
+    set(CURLOPT_TCP_FASTOPEN, _configuration.allowFastOpenAndTickets ? 1L : 0L);
+    set(CURLOPT_SSL_SESSIONID_CACHE, _configuration.allowFastOpenAndTickets ? 1L : 0L);
+    if (const auto idle = connectionPurgeTimeout(_configuration))
+        set(CURLOPT_MAXAGE_CONN, static_cast<long>(toSeconds(*idle)));
+    if (!_configuration.caFile.empty()) set(CURLOPT_CAINFO, _configuration.caFile.c_str());
+    if (_configuration.allowFastOpenAndTickets) {
+        // libcurl switches session tickets off; they save a round trip on every new connection.
+        set(
+            CURLOPT_SSL_CTX_FUNCTION, +[](CURL*, void* context, void*) -> CURLcode {
+                SSL_CTX_clear_options(static_cast<SSL_CTX*>(context), SSL_OP_NO_TICKET);
+                return CURLE_OK;
+            });
+    }
+    set(CURLOPT_WRITEDATA, this);
+    set(
+        CURLOPT_WRITEFUNCTION, +[](char* data, std::size_t, std::size_t count, void* self) {
+            return static_cast<CurlLoad*>(self)->received({data, count});
+        });
+    set(CURLOPT_HEADERDATA, this);
+    set(
+        CURLOPT_HEADERFUNCTION, +[](char* data, std::size_t, std::size_t count, void* self) {
+            return static_cast<CurlLoad*>(self)->receivedHeader({data, count});
+        });
+    set(CURLOPT_PREREQDATA, this);
+    set(
+        CURLOPT_PREREQFUNCTION,
+        +[](void* self, char* address, char*, int, int) { return static_cast<CurlLoad*>(self)->mayConnect(address); });
+}
+
+void CurlLoad::setHeaders(bool hasBody)
+{
+    const auto add = [this](const std::string& line) {
+        if (curl_slist* extended = curl_slist_append(_headerList, line.c_str())) _headerList = extended;
+    };
+    for (const auto& [name, value] : _hop.headers) {
+        // "Name;" is how libcurl is told to send an empty field.
+        const std::string line = value.empty() ? name + ";" : name + ": " + value;
+        if (line.find_first_of("\r\n") == std::string::npos) add(line);
+    }
+    if (!_hop.headers.find("Accept-Encoding")) add(fmt::format("Accept-Encoding: {}", ContentDecoder::kAccepted));
+    if (hasBody) {
+        // Neither waiting for "100 Continue", nor a form.
+        add("Expect:");
+        if (!_hop.headers.find("Content-Type")) add("Content-Type:");
+    }
+    curl_easy_setopt(_easy, CURLOPT_HTTPHEADER, _headerList);
+}
+
+bool CurlLoad::setUpload()
+{
+    struct stat status{};
+    if (fstat(_files->upload.fd(), &status) != 0) {
+        _error = Error::posix(errno, "a transfer's file");
+        return false;
+    }
+    _uploadSize = static_cast<std::uint64_t>(status.st_size);
+    curl_easy_setopt(_easy, CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(_uploadSize));
+    curl_easy_setopt(_easy, CURLOPT_READDATA, this);
+    curl_easy_setopt(
+        _easy, CURLOPT_READFUNCTION, +[](char* buffer, std::size_t size, std::size_t count, void* self) {
+            return static_cast<CurlLoad*>(self)->readUpload(buffer, size * count);
+        });
+    // From its start, for a connection that turned out to be closed.
+    curl_easy_setopt(_easy, CURLOPT_SEEKDATA, this);
+    curl_easy_setopt(
+        _easy, CURLOPT_SEEKFUNCTION, +[](void* self, curl_off_t offset, int origin) {
+            if (origin != SEEK_SET || offset < 0) return CURL_SEEKFUNC_FAIL;
+            static_cast<CurlLoad*>(self)->_uploaded = static_cast<std::uint64_t>(offset);
+            return CURL_SEEKFUNC_OK;
+        });
+    return true;
+}
+
+std::size_t CurlLoad::readUpload(char* buffer, std::size_t size)
+{
+    _lastProgress = std::chrono::steady_clock::now();
+    ssize_t count = -1;
+    do count = pread(_files->upload.fd(), buffer, size, static_cast<off_t>(_uploaded));
+    while (count < 0 && errno == EINTR);
+    // A file that became shorter must not be sent as if it were whole.
+    if (count < 0 || (count == 0 && size > 0 && _uploaded < _uploadSize)) {
+        _error = Error::posix(count < 0 ? errno : EIO, "a transfer's file");
+        return CURL_READFUNC_ABORT;
+    }
+    _uploaded += static_cast<std::uint64_t>(count);
+    if (_files->progress && count > 0) _files->progress(_uploaded, _uploadSize);
+    return static_cast<std::size_t>(count);
+}
+
+/// A public host must not lead us to an address of the inner network, by a redirect or by naming a URL.
+int CurlLoad::mayConnect(const char* address)
+{
+    _sent = true;
+    _publicPeer = isPublicAddress(address);
+    if (!_hop.source || !_hop.source->isPublic || _publicPeer) return CURL_PREREQFUNC_OK;
+    _error = urlError(kUrlForbiddenRedirect, "led to an address that isn't public");
+    return CURL_PREREQFUNC_ABORT;
+}
+
+// ---- receiving ----
+
+std::size_t CurlLoad::receivedHeader(std::string_view line)
+{
+    _lastProgress = std::chrono::steady_clock::now();
+    _anyHeader = true;
+    _headerSize += line.size();
+    if (_headerSize > kMaximumHeaderSize) {
+        _error = urlError(kUrlTooLarge, fmt::format("more than {} bytes of header fields", kMaximumHeaderSize));
+        return 0;
+    }
+    if (line.starts_with("HTTP/")) {
+        _headers = {}; // of an interim answer
+        _headersEnded = false;
+        return line.size();
+    }
+    if (_headersEnded) return line.size();
+    if (line == "\r\n" || line == "\n") {
+        _headersEnded = true;
+        _decoder = ContentDecoder(_headers.list("Content-Encoding"));
+        return line.size();
+    }
+    const std::size_t colon = line.find(':');
+    if (colon == std::string_view::npos) return line.size();
+    std::string_view value = line.substr(colon + 1);
+    const auto isBlank = [](char c) { return c == ' ' || c == '\t' || c == '\r' || c == '\n'; };
+    while (!value.empty() && isBlank(value.front())) value.remove_prefix(1);
+    while (!value.empty() && isBlank(value.back())) value.remove_suffix(1);
+    _headers.add(std::string(line.substr(0, colon)), std::string(value));
+    return line.size();
+}
+
+std::size_t CurlLoad::received(std::string_view bytes)
+{
+    _lastProgress = std::chrono::steady_clock::now();
+    _wireSize += bytes.size();
+    if (_decoder.feed(bytes, [this](std::string_view decoded) { return keep(decoded); }) && _wireSize <= maximumSize())
+        return bytes.size();
+    if (!_error && _wireSize > maximumSize())
+        _error = urlError(kUrlTooLarge, fmt::format("more than {} bytes", maximumSize()));
+    if (!_error) _error = urlError(kUrlBadResponse, "the body isn't what its content coding says");
+    return 0;
+}
+
+bool CurlLoad::keep(std::string_view bytes)
+{
+    if (_bodySize + bytes.size() > maximumSize()) {
+        _error = urlError(kUrlTooLarge, fmt::format("more than {} bytes", maximumSize()));
+        return false;
+    }
+    if (_files) {
+        if (!store(bytes)) return false;
+    } else {
+        if (_inMemory + bytes.size() > kMaximumInMemory) {
+            _error = urlError(kUrlTooLarge, fmt::format("more than {} bytes in all loads", kMaximumInMemory));
+            return false;
+        }
+        if (_body.empty() && !_decoder.decodes()) {
+            curl_off_t length = -1;
+            curl_easy_getinfo(_easy, CURLINFO_CONTENT_LENGTH_DOWNLOAD_T, &length);
+            const auto expected = static_cast<std::size_t>(std::max<curl_off_t>(length, 0));
+            _body.reserve(std::min(expected, maximumSize()));
+        }
+        _body.append(bytes);
+        _inMemory += bytes.size();
+    }
+    _bodySize += bytes.size();
+    return true;
+}
+
+bool CurlLoad::store(std::string_view bytes)
+{
+    if (!_files->download) return true;
+    for (std::size_t written = 0; written < bytes.size();) {
+        const ssize_t count = pwrite(_files->download.fd(), bytes.data() + written, bytes.size() - written,
+                                     static_cast<off_t>(_bodySize + written));
+        if (count < 0 && errno != EINTR) {
+            _error = Error::posix(errno, "a transfer's file");
+            return false;
+        }
+        if (count > 0) written += static_cast<std::size_t>(count);
+    }
+    return true;
+}
+
+/// The body of an earlier hop isn't the answer's.
+bool CurlLoad::forgetBody()
+{
+    _inMemory -= _body.size();
+    _body.clear();
+    _wireSize = 0;
+    if (std::exchange(_bodySize, 0) == 0 || !_files || !_files->download) return true;
+    if (ftruncate(_files->download.fd(), 0) != 0) _error = Error::posix(errno, "a transfer's file");
+    return !_error;
+}
+
+// ---- the end of a hop ----
+
+UrlResponse CurlLoad::response() const
+{
+    return {.url = _hop.url,
+            .isHttp = true,
+            .statusCode = status(),
+            .headers = _headers,
+            .publicPeer = _publicPeer || (_hop.source && _hop.source->isPublic)};
+}
+
+/// True if the request went out on a connection that was open before, and nothing came back: the server had closed it,
+/// or did so at that moment. libcurl tries other old connections, which may be as dead, and gives up after five.
+bool CurlLoad::wasLostUnanswered(CURLcode code) const
+{
+    if (_fresh || _anyHeader || _error) return false;
+    long made = 0;
+    curl_easy_getinfo(_easy, CURLINFO_NUM_CONNECTS, &made);
+    return made == 0 && (code == CURLE_SEND_ERROR || code == CURLE_RECV_ERROR || code == CURLE_GOT_NOTHING ||
+                         code == CURLE_HTTP2 || code == CURLE_HTTP2_STREAM);
+}
+
+bool CurlLoad::goesOn(CURLcode code)
+{
+    if (wasLostUnanswered(code)) {
+        _fresh = true;
+        return true;
+    }
+    if (_error || (code != CURLE_OK && !(hasUpload() && isFinal()))) return false;
+    const UrlSource source{.secure = _hop.url.scheme() == "https" || (_hop.source && _hop.source->secure),
+                           .isPublic = _publicPeer || (_hop.source && _hop.source->isPublic)};
+    auto next = redirected(_hop, hasUpload() || !_hop.body.empty(), response(), source);
+    if (!next) return false;
+    if (!*next) {
+        _error = std::move(next->error());
+        return false;
+    }
+    if (_redirects == _configuration.maximumRedirects) {
+        _error = urlError(kUrlTooManyRedirects, fmt::format("more than {} redirects", _redirects));
+        return false;
+    }
+    ++_redirects;
+    _uploads = _uploads && (*next)->method == _hop.method;
+    _hop = std::move(**next);
+    _fresh = false;
+    _marks.redirectEnd = monotonicSeconds();
+    return true;
+}
+
+std::optional<Error> CurlLoad::errorOf(CURLcode code) const
+{
+    // What an upload is answered is its status, whatever becomes of the connection, or of the rest of the body, then.
+    if (hasUpload() && !_files->download && isFinal() && (!_error || _error->code == kUrlTimedOut)) return std::nullopt;
+    if (_error) return _error;
+    // libcurl has one code for two faults.
+    if (code == CURLE_UNSUPPORTED_PROTOCOL && _sent)
+        return urlError(kUrlBadResponse, fmt::format("the answer isn't HTTP: {}", _errorText.data()));
+    if (code != CURLE_OK) return urlErrorFromCurl(code, _errorText.data());
+    if (!_decoder.finished()) return urlError(kUrlBadResponse, "the body ends before its content coding does");
+    return std::nullopt;
+}
+
+CurlLoad::Outcome CurlLoad::finish(CURLcode code)
+{
+    Outcome outcome;
+    outcome.error = errorOf(code);
+    if (_easy) {
+        if (status() > 0) outcome.response = response();
+        outcome.timing = timingDataOf(_easy, _marks);
+    }
+    if (!outcome.error) {
+        _inMemory -= _body.size();
+        outcome.data = Bytes(std::exchange(_body, {}));
+    }
+    _easy = nullptr;
+    return outcome;
+}
+
+} // namespace platform
