@@ -16,7 +16,7 @@ Bytef* bytes(const char* text)
     return reinterpret_cast<Bytef*>(const_cast<char*>(text)); // zlib doesn't write to its input
 }
 
-/// Packs `repetitions` times `piece`, and then its first `rest` bytes.
+/// Compresses `piece` repeated `repetitions` times, followed by its first `rest` bytes.
 std::string pack(std::string_view piece, std::size_t repetitions, std::size_t rest, int windowBits)
 {
     z_stream stream{};
@@ -44,6 +44,11 @@ std::string gzipOfBlanks(std::size_t count)
 {
     const std::string blanks(1u << 16, ' ');
     return pack(blanks, count / blanks.size(), count % blanks.size(), kGzip);
+}
+
+std::string gzipPacked(std::string_view piece)
+{
+    return pack(piece, 0, piece.size(), kGzip);
 }
 
 std::string zlibPacked(std::string_view piece)

@@ -1,131 +1,215 @@
 #include "tools/devserver/HttpServer.h"
 
 #include <algorithm>
-#include <atomic>
+#include <arpa/inet.h>
+#include <array>
 #include <cerrno>
+#include <charconv>
 #include <cstring>
+#include <fstream>
+#include <iterator>
+#include <netdb.h>
+#include <stdexcept>
 #include <sys/socket.h>
-#include <thread>
+#include <system_error>
 
-#include <httplib.h>
+#include <microhttpd.h>
 
-#include "tools/devserver/Connections.h"
+#include "platform/base/FileHandle.h"
+#include "tools/devserver/Compression.h"
 
 namespace devserver {
 namespace {
 
-constexpr std::size_t kThreads = 48; // a kept-alive connection holds one
 constexpr int kBacklog = 128;
-constexpr std::size_t kPaddingPiece = 1u << 16;
-constexpr const char* kEncodingAsSent = "X-Devserver-Content-Encoding";
+constexpr unsigned kIdleSeconds = 60;
+/// Header fields of a request, and the buffers to read and write with.
+constexpr std::size_t kConnectionMemory = 64u << 10;
+constexpr std::size_t kPiece = 1u << 16;
+constexpr std::size_t kPackedFrom = 256; // smaller bodies hardly shrink
 
-/// Has the library read the body as it was sent. The request is its own and not const, it only says so to its
-/// callbacks.
-void prepareBody(const httplib::Request& request)
-{
-    auto& headers = const_cast<httplib::Request&>(request).headers;
-    // It would unpack the body by itself, and refuse raw DEFLATE.
-    if (const auto found = headers.find("Content-Encoding"); found != headers.end()) {
-        std::string encoding = found->second;
-        headers.erase("Content-Encoding");
-        headers.emplace(kEncodingAsSent, std::move(encoding));
-    }
-    // It would wait for the connection's end, where HTTP says that there is no body.
-    if (!request.has_header("Content-Length") && !request.has_header("Transfer-Encoding"))
-        headers.emplace("Content-Length", "0");
-}
-
-Request convert(const httplib::Request& from, bool secure)
-{
+/// A request while it arrives.
+struct Exchange {
     Request request;
-    request.method = from.method;
-    const std::size_t mark = from.target.find('?');
-    request.path = from.target.substr(0, mark);
-    if (mark != std::string::npos) request.query = from.target.substr(mark + 1);
-    for (const auto& [name, value] : from.headers) {
-        // The library adds the ends of the connection as headers.
-        if (name.starts_with("REMOTE_") || name.starts_with("LOCAL_")) continue;
-        request.headers.emplace_back(name == kEncodingAsSent ? "Content-Encoding" : name, value);
+    bool begun = false;
+    bool tooLarge = false;
+};
+
+std::string contentsOf(const std::filesystem::path& path)
+{
+    std::ifstream file(path, std::ios::binary);
+    return {std::istreambuf_iterator<char>(file), {}};
+}
+
+/// The address and the port of a socket's name.
+std::pair<std::string, int> endOf(const sockaddr& address)
+{
+    std::array<char, INET6_ADDRSTRLEN> text{};
+    if (address.sa_family == AF_INET) {
+        const auto& v4 = reinterpret_cast<const sockaddr_in&>(address);
+        inet_ntop(AF_INET, &v4.sin_addr, text.data(), text.size());
+        return {text.data(), ntohs(v4.sin_port)};
     }
-    request.body = from.body;
-    request.peer = from.remote_addr;
-    request.secure = secure;
-    request.connection = connectionBetween(from.local_port, from.remote_port);
-    return request;
+    const auto& v6 = reinterpret_cast<const sockaddr_in6&>(address);
+    inet_ntop(AF_INET6, &v6.sin6_addr, text.data(), text.size());
+    return {text.data(), ntohs(v6.sin6_port)};
 }
 
-/// A body that is written piece by piece: half of it and then the connection's end, or followed by blanks.
-void setStreamedBody(httplib::Response& response, Answer answer)
+std::string headerOf(const Headers& headers, std::string_view name)
 {
-    const std::size_t length = std::max<std::size_t>({answer.body.size(), answer.paddedTo, 2});
-    const std::size_t end = answer.cut ? length / 2 : length;
-    auto write = [body = std::move(answer.body), end](std::size_t offset, std::size_t, httplib::DataSink& sink) {
-        if (offset >= end) return false; // less than was announced: the library closes the connection
-        if (offset < body.size()) return sink.write(body.data() + offset, std::min(body.size(), end) - offset);
-        return sink.write(std::string(kPaddingPiece, ' ').data(), std::min(kPaddingPiece, end - offset));
-    };
-    response.set_content_provider(length, answer.contentType, std::move(write));
+    const std::string* value = findHeader(headers, name);
+    return value ? *value : "";
 }
 
-/// A body without an end; the connection's is all that the client gets.
-void setEndlessBody(httplib::Response& response, Answer answer)
+/// What the library asks for piece by piece: a padded, cut or endless body.
+struct Stream {
+    Answer answer;
+    std::size_t length = 0; // as announced; endless bodies have none
+    std::size_t end = 0;
+
+    /// Writes the bytes at `offset`, `size` at most; -2 ends the connection.
+    ssize_t read(std::size_t offset, char* buffer, std::size_t size)
+    {
+        const std::string& body = answer.body;
+        if (answer.goesOn && offset >= body.size()) {
+            if (!answer.goesOn()) return MHD_CONTENT_READER_END_WITH_ERROR;
+            *buffer = ' ';
+            return 1;
+        }
+        if (!answer.goesOn && offset >= end) return MHD_CONTENT_READER_END_WITH_ERROR; // less than was announced
+        const bool inBody = offset < body.size();
+        const std::size_t limit = answer.goesOn ? body.size() : inBody ? std::min(body.size(), end) : end;
+        const std::size_t count = std::min(size, limit - offset);
+        if (inBody)
+            std::memcpy(buffer, body.data() + offset, count);
+        else
+            std::memset(buffer, ' ', count);
+        return static_cast<ssize_t>(count);
+    }
+};
+
+using Response = std::unique_ptr<MHD_Response, decltype(&MHD_destroy_response)>;
+
+Response streamed(Answer answer)
 {
+    auto stream = std::make_unique<Stream>();
+    stream->length = std::max<std::size_t>({answer.body.size(), answer.paddedTo, 2});
+    stream->end = answer.cut ? stream->length / 2 : stream->length;
+    const std::uint64_t size = answer.goesOn ? MHD_SIZE_UNKNOWN : stream->length;
+    stream->answer = std::move(answer);
+    return {MHD_create_response_from_callback(
+                size, kPiece,
+                [](void* self, std::uint64_t offset, char* buffer, std::size_t room) {
+                    return static_cast<Stream*>(self)->read(offset, buffer, room);
+                },
+                stream.release(), [](void* self) { delete static_cast<Stream*>(self); }),
+            MHD_destroy_response};
+}
+
+/// The answer as the library sends it. Bodies that are sent whole are packed for clients that accept it.
+Response responseOf(Answer answer, const Request& request)
+{
+    const Headers headers = answer.headers;
     const std::string type = answer.contentType;
-    response.set_chunked_content_provider(type,
-                                          [answer = std::move(answer)](std::size_t offset, httplib::DataSink& sink) {
-                                              if (offset == 0 && !answer.body.empty())
-                                                  return sink.write(answer.body.data(), answer.body.size());
-                                              return answer.goesOn() && sink.write(" ", 1);
-                                          });
-}
-
-void convert(Answer answer, httplib::Response& response)
-{
-    response.status = answer.status;
-    for (const auto& [name, value] : answer.headers) response.set_header(name, value);
-    if (answer.goesOn) return setEndlessBody(response, std::move(answer));
-    // What is sent whole, the library packs for clients that accept it.
-    const bool packed = findHeader(answer.headers, "Content-Encoding") != nullptr;
-    if (packed || answer.cut || answer.paddedTo > answer.body.size())
-        setStreamedBody(response, std::move(answer));
-    else if (!answer.body.empty())
-        response.set_content(answer.body, answer.contentType);
+    const bool hasBody = !answer.body.empty() || answer.goesOn || answer.paddedTo > 0 || answer.cut;
+    bool packed = false;
+    Response response(nullptr, MHD_destroy_response);
+    if (answer.goesOn || answer.cut || answer.paddedTo > answer.body.size()) {
+        response = streamed(std::move(answer));
+    } else {
+        packed = answer.body.size() >= kPackedFrom && type == "application/json" &&
+                 !findHeader(headers, "Content-Encoding") &&
+                 headerOf(request.headers, "Accept-Encoding").find("gzip") != std::string::npos;
+        if (packed) answer.body = gzipPacked(answer.body);
+        response.reset(MHD_create_response_from_buffer(answer.body.size(), answer.body.data(), MHD_RESPMEM_MUST_COPY));
+    }
+    if (!response) throw std::bad_alloc();
+    if (hasBody) MHD_add_response_header(response.get(), "Content-Type", type.c_str());
+    if (packed) MHD_add_response_header(response.get(), "Content-Encoding", "gzip");
+    for (const auto& [name, value] : headers) MHD_add_response_header(response.get(), name.c_str(), value.c_str());
+    return response;
 }
 
 } // namespace
 
 struct HttpServer::Implementation {
-    std::unique_ptr<httplib::Server> server;
-    bool secure = false;
-    int listening = -1; // the library's descriptor
-    int port = 0;
-    std::thread thread;
-    std::atomic<bool> ended = false;
+    std::string certificate; // PEM; empty for plain HTTP
+    std::string key;
+    platform::FileHandle listener; // until the daemon has it
+    Handler handler;
+    MHD_Daemon* daemon = nullptr;
+
+    static Implementation& of(void* self) { return *static_cast<Implementation*>(self); }
+
+    /// The raw target, before the library takes it apart.
+    static void* begin(void*, const char* target, MHD_Connection*)
+    {
+        auto exchange = std::make_unique<Exchange>();
+        const std::string_view text(target);
+        const std::size_t mark = text.find('?');
+        exchange->request.path = text.substr(0, mark);
+        if (mark != text.npos) exchange->request.query = text.substr(mark + 1);
+        return exchange.release();
+    }
+    static void end(void*, MHD_Connection*, void** state, MHD_RequestTerminationCode)
+    {
+        delete static_cast<Exchange*>(*state);
+        *state = nullptr;
+    }
+
+    void fillIn(Request& request, MHD_Connection* connection, const char* method) const
+    {
+        request.method = method;
+        request.secure = !certificate.empty();
+        request.connection = MHD_get_connection_info(connection, MHD_CONNECTION_INFO_CONNECTION_FD)->connect_fd;
+        request.peer =
+            endOf(*MHD_get_connection_info(connection, MHD_CONNECTION_INFO_CLIENT_ADDRESS)->client_addr).first;
+        MHD_get_connection_values(
+            connection, MHD_HEADER_KIND,
+            [](void* headers, MHD_ValueKind, const char* name, const char* value) {
+                static_cast<Headers*>(headers)->emplace_back(name, value ? value : "");
+                return MHD_YES;
+            },
+            &request.headers);
+    }
+
+    MHD_Result take(MHD_Connection* connection, const char* method, const char* piece, std::size_t* size,
+                    Exchange& exchange)
+    {
+        Request& request = exchange.request;
+        if (!exchange.begun) {
+            exchange.begun = true;
+            fillIn(request, connection, method);
+            const std::string length = headerOf(request.headers, "Content-Length");
+            std::size_t announced = 0;
+            std::from_chars(length.data(), length.data() + length.size(), announced);
+            if (announced > kMaximumBody) return refuse(connection);
+            return MHD_YES;
+        }
+        if (*size > 0) {
+            exchange.tooLarge = exchange.tooLarge || request.body.size() + *size > kMaximumBody;
+            if (!exchange.tooLarge) request.body.append(piece, *size);
+            *size = 0;
+            return MHD_YES;
+        }
+        if (exchange.tooLarge) return refuse(connection);
+        const Answer answer = handler(request);
+        return MHD_queue_response(connection, static_cast<unsigned>(answer.status), responseOf(answer, request).get());
+    }
+
+    static MHD_Result refuse(MHD_Connection* connection)
+    {
+        const Answer answer = errorAnswer(413, "a body has " + std::to_string(kMaximumBody) + " bytes at most");
+        return MHD_queue_response(connection, 413, responseOf(answer, {}).get());
+    }
 };
 
 HttpServer::HttpServer(std::optional<tavrin::tools::CertificateFiles> certificate)
     : _implementation(std::make_unique<Implementation>())
 {
-    Implementation& self = *_implementation;
-    self.secure = certificate.has_value();
-    if (certificate)
-        self.server = std::make_unique<httplib::SSLServer>(certificate->certificate.c_str(), certificate->key.c_str());
-    else
-        self.server = std::make_unique<httplib::Server>();
-    httplib::Server& server = *self.server;
-    server.new_task_queue = [] { return new httplib::ThreadPool(kThreads); };
-    server.set_keep_alive_max_count(100'000);
-    server.set_keep_alive_timeout(60);
-    server.set_read_timeout(30);
-    server.set_write_timeout(30);
-    server.set_payload_max_length(kMaximumBody);
-    server.set_tcp_nodelay(true);
-    server.set_socket_options([&self](socket_t socket) {
-        // Not the library's default, with which two processes share a port.
-        const int yes = 1;
-        setsockopt(socket, SOL_SOCKET, SO_REUSEADDR, &yes, sizeof yes);
-        self.listening = socket;
-    });
+    if (!certificate) return;
+    _implementation->certificate = contentsOf(certificate->certificate);
+    _implementation->key = contentsOf(certificate->key);
 }
 
 HttpServer::~HttpServer()
@@ -135,49 +219,58 @@ HttpServer::~HttpServer()
 
 std::expected<int, std::string> HttpServer::bind(const std::string& address, int port)
 {
-    Implementation& self = *_implementation;
-    if (!self.server->is_valid()) return std::unexpected("the certificate can't be used");
-    errno = 0;
-    self.port = port == 0                                  ? self.server->bind_to_any_port(address)
-                : self.server->bind_to_port(address, port) ? port
-                                                           : -1;
-    if (self.port <= 0) {
-        if (errno == EADDRINUSE) return std::unexpected("taken");
-        return std::unexpected(errno ? std::strerror(errno) : "no such address");
-    }
-    listen(self.listening, kBacklog); // the library's own is 5
-    return self.port;
+    addrinfo hints{};
+    hints.ai_flags = AI_PASSIVE | AI_NUMERICSERV;
+    hints.ai_socktype = SOCK_STREAM;
+    addrinfo* found = nullptr;
+    if (getaddrinfo(address.c_str(), std::to_string(port).c_str(), &hints, &found) != 0)
+        return std::unexpected("no such address");
+    const std::unique_ptr<addrinfo, decltype(&freeaddrinfo)> owner(found, freeaddrinfo);
+    platform::FileHandle listener(socket(found->ai_family, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    const int yes = 1;
+    setsockopt(listener.fd(), SOL_SOCKET, SO_REUSEADDR, &yes, sizeof yes);
+    sockaddr_storage bound{};
+    socklen_t size = sizeof bound;
+    if (::bind(listener.fd(), found->ai_addr, found->ai_addrlen) != 0 || listen(listener.fd(), kBacklog) != 0 ||
+        getsockname(listener.fd(), reinterpret_cast<sockaddr*>(&bound), &size) != 0)
+        return std::unexpected(errno == EADDRINUSE ? "taken" : std::strerror(errno));
+    _implementation->listener = std::move(listener);
+    return endOf(reinterpret_cast<const sockaddr&>(bound)).second;
 }
 
 void HttpServer::start(Handler handler)
 {
     Implementation& self = *_implementation;
-    const auto serve = [handler = std::move(handler), secure = self.secure](const httplib::Request& from,
-                                                                            httplib::Response& to) {
-        convert(handler(convert(from, secure)), to);
+    self.handler = std::move(handler);
+    std::vector<MHD_OptionItem> options{
+        {MHD_OPTION_LISTEN_SOCKET, self.listener.fd(), nullptr},
+        {MHD_OPTION_CONNECTION_TIMEOUT, kIdleSeconds, nullptr},
+        {MHD_OPTION_CONNECTION_MEMORY_LIMIT, kConnectionMemory, nullptr},
+        {MHD_OPTION_URI_LOG_CALLBACK, reinterpret_cast<std::intptr_t>(&Implementation::begin), nullptr},
+        {MHD_OPTION_NOTIFY_COMPLETED, reinterpret_cast<std::intptr_t>(&Implementation::end), nullptr},
     };
-    httplib::Server& server = *self.server;
-    server.set_pre_routing_handler([](const httplib::Request& request, httplib::Response&) {
-        prepareBody(request);
-        return httplib::Server::HandlerResponse::Unhandled;
-    });
-    server.Get(".*", serve).Post(".*", serve).Put(".*", serve).Patch(".*", serve).Delete(".*", serve);
-    self.thread = std::thread([&self] {
-        self.server->listen_after_bind();
-        self.ended = true;
-    });
+    if (!self.certificate.empty()) {
+        options.push_back({MHD_OPTION_HTTPS_MEM_CERT, 0, self.certificate.data()});
+        options.push_back({MHD_OPTION_HTTPS_MEM_KEY, 0, self.key.data()});
+    }
+    options.push_back({MHD_OPTION_END, 0, nullptr});
+    unsigned flags = MHD_USE_THREAD_PER_CONNECTION | MHD_USE_INTERNAL_POLLING_THREAD | MHD_USE_POLL;
+    if (!self.certificate.empty()) flags |= MHD_USE_TLS;
+    self.daemon = MHD_start_daemon(
+        flags, 0, nullptr, nullptr,
+        [](void* implementation, MHD_Connection* connection, const char*, const char* method, const char*,
+           const char* piece, std::size_t* size, void** state) {
+            return Implementation::of(implementation)
+                .take(connection, method, piece, size, *static_cast<Exchange*>(*state));
+        },
+        &self, MHD_OPTION_ARRAY, options.data(), MHD_OPTION_END);
+    if (!self.daemon) throw std::runtime_error("the HTTP server didn't start: the certificate can't be used");
+    (void)self.listener.release();
 }
 
 void HttpServer::stop()
 {
-    Implementation& self = *_implementation;
-    if (!self.thread.joinable()) return;
-    // The library ignores a stop before its thread has come to listen.
-    while (!self.server->is_running() && !self.ended) std::this_thread::yield();
-    self.server->stop();
-    // It would wait for idle connections until their time is over.
-    shutDownConnections(self.port);
-    self.thread.join();
+    if (MHD_Daemon* const daemon = std::exchange(_implementation->daemon, nullptr)) MHD_stop_daemon(daemon);
 }
 
 } // namespace devserver

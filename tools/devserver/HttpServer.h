@@ -11,24 +11,24 @@
 
 namespace devserver {
 
-/// One listening socket and the threads that serve its connections, over HTTP/1.1.
+/// One listening socket, and a thread for each of its connections, which serves HTTP/1.1.
 class HttpServer {
 public:
     static constexpr std::size_t kMaximumBody = 16u << 20;
 
-    /// Called for each request, on one of the server's threads; several at once.
+    /// Called for each request, on its connection's thread: it may take its time.
     using Handler = std::function<Answer(const Request&)>;
 
-    /// Without a certificate plain HTTP.
+    /// Serves plain HTTP if there is no certificate.
     explicit HttpServer(std::optional<tavrin::tools::CertificateFiles> certificate = {});
-    /// Stops.
+    /// Calls `stop`.
     ~HttpServer();
 
-    /// Takes the port (0: any free one) and returns it. The error is a short text: "taken".
+    /// Binds the port (0: any free one) and returns it. The error is "taken" for a port in use, or the system's text.
     std::expected<int, std::string> bind(const std::string& address, int port);
-    /// Serves from here on, on threads of its own. Once, after `bind`.
+    /// Starts serving. Call it once, after `bind`. Throws if the certificate can't be used.
     void start(Handler handler);
-    /// Closes all connections and returns when no handler runs any more.
+    /// Closes all connections; returns after the last handler has returned.
     void stop();
 
 private:
