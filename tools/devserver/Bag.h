@@ -11,10 +11,10 @@
 
 namespace devserver {
 
-/// The bag that is served: endpoints of this service, and whatever control put over them. Any thread.
+/// The bag that is served: this service's endpoints, with the overrides set by control calls. Any thread.
 class Bag {
 public:
-    /// `base` is the service's own address over HTTPS.
+    /// `base` is the service's own HTTPS address, "https://127.0.0.1:8443".
     explicit Bag(std::string base);
 
     [[nodiscard]] platform::Value document() const;
@@ -22,20 +22,20 @@ public:
 
     /// Raises the version by 1 and returns it.
     std::int64_t bump();
-    /// Raises the version of all downloadable resources, and with it their URLs, above what any of them had, and
-    /// returns it; or of the one that is named. Refused with a reason: a name that none of them has.
+    /// Gives all downloadable resources, or only the named one, a version above all of theirs, which changes their
+    /// URLs. Returns the version. The error says that no resource has the name.
     std::expected<std::int64_t, std::string> bumpResources(const std::string& name = "");
-    /// Puts an object's keys over the bag's; null removes a key; a whole "version" sets the number that `bump` raises.
-    /// Refused with a reason: anything but an object, and more overrides than are kept.
+    /// Overrides the bag's keys with those of an object; null removes a key; an integer "version" sets the number that
+    /// `bump` raises. The error says why: not an object, or more than 256 KiB of overrides.
     std::expected<void, std::string> merge(const platform::Value& keys);
-    /// Forgets what `merge` did. The version stays: it only counts up.
+    /// Removes all overrides. The version stays: it only grows.
     void reset();
 
 private:
     const std::string _base;
     mutable std::mutex _mutex;
     std::int64_t _version = 1;
-    std::map<std::string, std::int64_t, std::less<>> _resourceVersions; ///< of every resource
+    std::map<std::string, std::int64_t, std::less<>> _resourceVersions; ///< by resource
     platform::Dictionary _overrides;
 };
 

@@ -8,36 +8,36 @@
 
 namespace devserver {
 
-/// A kind of results, shown together.
+/// A section of results.
 struct Section {
     std::string_view key; ///< "places"; the table's name
     std::string_view name;
     std::string_view bundleIdentifier;
-    std::string_view host; ///< of its entries' URLs
-    std::string_view type; ///< of its results
+    std::string_view host; ///< host of its entries' URLs
+    std::string_view type; ///< type of its results
 };
 
 struct Entry {
-    std::string identifier; ///< section and a digest of the URL; stays when other entries come and go
+    std::string identifier; ///< section and digest of the URL; independent of other entries
     const Section* section = nullptr;
     std::string title;
     std::string url;
     std::string description;
     unsigned popularity = 0; ///< 1 to 1000
-    std::string keywords;    ///< further words that find it
+    std::string keywords;    ///< more words that match it
     Folded foldedTitle;
     std::vector<Word> titleWords;
     std::vector<std::string> foldedKeywords;
 };
 
-/// What the service can find: tables compiled in from catalogue/. Immutable.
+/// All that the service can find: the tables of catalogue/, compiled in. Immutable, hence any thread.
 class Catalogue {
 public:
-    /// Throws std::runtime_error, with table and line, for a row that isn't "title, popularity, description, keywords".
+    /// Throws std::runtime_error, naming table and line, if a row isn't "title, popularity, description, keywords".
     Catalogue();
 
     [[nodiscard]] const std::vector<Entry>& entries() const { return _entries; }
-    /// Null where there is none.
+    /// Returns null if there is none.
     [[nodiscard]] const Entry* find(std::string_view identifier) const;
 
 private:
@@ -45,7 +45,7 @@ private:
 };
 
 [[nodiscard]] const std::vector<Section>& sections();
-/// Null where there is none.
+/// Returns null if there is none.
 [[nodiscard]] const Section* findSection(std::string_view key);
 
 } // namespace devserver

@@ -26,7 +26,7 @@ Answer done()
     return jsonAnswer(Value::dictionaryOf({{"done", true}}));
 }
 
-/// What is wrong with the body's keys, if anything.
+/// Names the first key of the body that isn't allowed; nullopt if all are.
 std::optional<std::string> unknownKey(const Value& body, const std::vector<std::string_view>& allowed)
 {
     for (const auto& [key, value] : *body.asDictionary())
@@ -46,7 +46,7 @@ std::optional<std::uint64_t> numberItem(const Request& request, std::string_view
     return number;
 }
 
-// ---- The calls: each takes the body, an object, and the request.
+// ---- The calls. `body` is an object.
 
 Answer addFault(Service& service, const Value& body, const Request&)
 {

@@ -6,8 +6,8 @@ namespace devserver {
 
 class Service;
 
-/// Answers what is under /control: faults, the bag, what was asked and uploaded. Only for clients of this machine, and
-/// not over TLS. Errors are {"error": "… what is allowed …"}.
+/// Answers a call under /control: faults, the bag, the log of requests and uploads. Only clients on this machine may
+/// call, and only over plain HTTP. Errors are {"error": text}, and the text says what is allowed.
 [[nodiscard]] Answer controlAnswer(Service& service, const Request& request);
 
 } // namespace devserver

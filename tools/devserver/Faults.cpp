@@ -22,7 +22,7 @@ namespace {
 struct KindEntry {
     std::string_view name;
     Kind kind;
-    std::string_view unit; // of the number; empty where there is none
+    std::string_view unit; // of the number; empty if it takes none
     std::uint64_t least = 0;
     std::uint64_t most = 0;
 };
@@ -74,7 +74,7 @@ std::expected<Fault, std::string> parseFault(std::string_view text)
     return fault;
 }
 
-/// The same keys and lengths, with every value of another type.
+/// The value with every leaf replaced by one of another type; keys and lengths stay.
 Value wrongValue(const Value& value)
 {
     switch (value.type()) {
@@ -94,7 +94,7 @@ Value wrongValue(const Value& value)
     }
 }
 
-/// This service under its other name, "https://localhost:8443".
+/// The service's address with its other host name: "https://localhost:8443" for a request to 127.0.0.1.
 std::string otherHost(const Request& request)
 {
     const std::string* host = findHeader(request.headers, "Host");
@@ -108,7 +108,7 @@ std::string spoiltJson(const std::string& body, Kind kind)
 {
     const auto value = platform::parseJson(body);
     if (kind == Kind::WrongValues && value) return platform::toJson(wrongValue(*value));
-    // An object where an array belongs, and the other way round.
+    // An array becomes an object, and anything else an array.
     if (value && value->asArray()) return platform::toJson(Value::dictionaryOf({{"results", *value}}));
     return platform::toJson(Value::Array{value ? *value : Value("no JSON")});
 }
@@ -145,7 +145,7 @@ void spoil(Answer& answer, const Fault& fault, const Request& request)
     case Kind::Endless: return;
     case Kind::Status:
         if (fault.number >= 300) answer = errorAnswer(0, fmt::format("status {} on demand", fault.number));
-        if (fault.number == 204 || fault.number == 304) answer.body.clear(); // HTTP allows them none
+        if (fault.number == 204 || fault.number == 304) answer.body.clear(); // HTTP allows them no body
         answer.status = static_cast<int>(fault.number);
         return;
     case Kind::Cut: answer.cut = true; return;

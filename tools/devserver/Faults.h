@@ -13,7 +13,7 @@
 
 namespace devserver {
 
-/// What goes wrong on demand, of one request.
+/// A fault that one request meets on demand.
 struct Fault {
     enum class Kind {
         Delay,
@@ -34,31 +34,32 @@ struct Fault {
         RetryAfter
     };
     Kind kind = Kind::Delay;
-    std::uint64_t number = 0; ///< milliseconds, status code, bytes, depth or seconds; 0 where the kind takes none
+    std::uint64_t number = 0; ///< milliseconds, status code, bytes, depth or seconds; 0 if the kind takes none
 
     friend bool operator==(const Fault&, const Fault&) = default;
 };
 
-/// Reads "delay:200,status:503". The error says what is allowed.
+/// Parses a list like "delay:200,status:503". The error says what is allowed.
 [[nodiscard]] std::expected<std::vector<Fault>, std::string> parseFaults(std::string_view text);
 
-/// Spoils an answer that was ready to go. Delays, hangs and bodies without an end change nothing here.
+/// Applies a fault to a finished answer. Delay, Hang and Endless change nothing here.
 void spoil(Answer& answer, const Fault& fault, const Request& request);
 
-/// The names of endpoints that faults, the log and the counters use.
+/// The names of the endpoints, as used by faults, the log and the counters.
 [[nodiscard]] const std::vector<std::string_view>& endpointNames();
 
-/// The faults that were asked for, in the order in which they came. Any thread.
+/// The rules that say which requests meet which faults, in the order of their arrival. Any thread.
 class Faults {
 public:
     static constexpr std::size_t kMaximumCount = 100;
 
-    /// `endpoint` is one of `endpointNames()` or "*". A count of 0 is until cleared. The error says what is allowed.
+    /// Adds a rule for the next `count` requests of an endpoint: one of `endpointNames()`, or "*" for all. A count of 0
+    /// lasts until `clear`. The error says what is allowed.
     std::expected<void, std::string> add(std::string_view endpoint, std::string_view fault, std::uint64_t count);
-    /// The faults of the next request of an endpoint: those of the first rule that fits. Counts them down.
+    /// Returns the faults of the first rule that matches the endpoint, and counts the rule down.
     [[nodiscard]] std::vector<Fault> take(std::string_view endpoint);
     void clear();
-    /// [{"endpoint", "fault", "left"}]; "left" 0 is until cleared.
+    /// [{"endpoint", "fault", "left"}]; "left" 0 means until cleared.
     [[nodiscard]] platform::Value list() const;
     [[nodiscard]] std::size_t count() const;
 

@@ -8,26 +8,27 @@
 
 namespace devserver {
 
-/// A text as it is compared: without case and diacritics, compatibility forms resolved, white space in single blanks
-/// and none in front. UTF-8.
+/// A text folded for comparison, in UTF-8: without case and diacritics, with compatibility forms resolved, each run of
+/// white space replaced by one blank, and none in front.
 struct Folded {
     std::string text;
-    /// For each byte of `text`, and its end: where in the original the character begins that it came from.
+    /// For each byte of `text`, and for its end: the position in the original of the character that it came from.
     std::vector<std::uint32_t> source;
 };
 
 [[nodiscard]] Folded fold(std::string_view text);
 
-/// A word's bytes in a folded text.
+/// The position of a word in a folded text, in bytes.
 struct Word {
     std::size_t begin = 0;
     std::size_t end = 0;
 };
 
-/// The words of a folded text, in order; a symbol or an emoji is a word. Scripts without blanks are cut by dictionary.
+/// The words of a folded text, in order. A symbol or an emoji is a word; scripts without blanks are split by
+/// dictionary.
 [[nodiscard]] std::vector<Word> wordsOf(std::string_view folded);
 
-/// Lower case by the root locale's rules.
+/// The text in lower case, by the rules of the root locale.
 [[nodiscard]] std::string lowerCased(std::string_view text);
 
 } // namespace devserver

@@ -9,25 +9,25 @@
 
 namespace devserver {
 
-/// Holds requests back: for a time, or until they are let go. Any thread.
+/// Holds requests back for a time, or until they are released. Any thread.
 class Gate {
 public:
     Gate();
 
     enum class Outcome { TimeOver, Released, PeerGone };
 
-    /// Waits until the time is over (none: for as long as it takes), `release` or `close` is called, or the peer of
-    /// `connection` (-1: not watched) has closed its end. Returns at once when the gate is closed.
+    /// Blocks until `time` has passed (nullopt: no limit), `release` or `close` is called, or the peer of `connection`,
+    /// a socket, has closed its end (-1: not watched). Returns at once if the gate is closed.
     Outcome wait(std::optional<std::chrono::milliseconds> time, int connection);
 
-    /// Lets everyone go who waits now.
+    /// Wakes all current waiters.
     void release();
-    /// Lets everyone go, and holds nobody from now on.
+    /// Wakes all waiters, and lets nobody wait from now on.
     void close();
 
 private:
     std::mutex _mutex;
-    std::shared_ptr<platform::FileHandle> _event; // an eventfd, signalled once for those who wait on it
+    std::shared_ptr<platform::FileHandle> _event; // an eventfd, signalled once; then the next waiters get a new one
     bool _closed = false;
 };
 

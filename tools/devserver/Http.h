@@ -10,25 +10,25 @@
 
 #include "platform/values/Value.h"
 
-/// What the service sees of HTTP: requests in, answers out. The library that speaks it stays in HttpServer.cpp.
+/// HTTP as the service sees it. Only HttpServer.cpp knows the library that speaks it.
 namespace devserver {
 
 using Headers = std::vector<std::pair<std::string, std::string>>;
 
-/// The value of the first header of that name, in any case; null where there is none.
+/// The value of the first header of that name, compared case-insensitively; null if there is none.
 [[nodiscard]] const std::string* findHeader(const Headers& headers, std::string_view name);
 
 struct Request {
     std::string method = "GET";
-    std::string path;  ///< percent-encoded, as it came
-    std::string query; ///< what follows "?", percent-encoded, as it came
+    std::string path;  ///< percent-encoded, as received
+    std::string query; ///< the part after "?", percent-encoded, as received
     Headers headers;
     std::string body;
     std::string peer;    ///< the client's address
-    bool secure = false; ///< came over TLS
-    int connection = -1; ///< the connection's descriptor, to notice that the peer went; -1 if unknown
+    bool secure = false; ///< received over TLS
+    int connection = -1; ///< the connection's socket, to notice that the peer left; -1 if unknown
 
-    /// The decoded value of the first query item of that name; "+" is a blank, as in forms.
+    /// The decoded value of the first query item of that name; nullopt if there is none. "+" is a blank, as in forms.
     [[nodiscard]] std::optional<std::string> item(std::string_view name) const;
 };
 
@@ -37,14 +37,14 @@ struct Answer {
     std::string contentType = "application/json";
     std::string body;
     Headers headers;
-    std::size_t paddedTo = 0; ///< blanks are sent after the body up to this length
+    std::size_t paddedTo = 0; ///< length to which the body is padded with blanks
     bool cut = false;         ///< the connection is closed in the middle of the body
-    /// Set: after the body, which tells no length, blanks are sent one by one for as long as this says.
+    /// If set, the body is sent without a length, followed by single blanks until this returns false.
     std::function<bool()> goesOn{};
 };
 
 [[nodiscard]] Answer jsonAnswer(const platform::Value& value, int status = 200);
-/// {"error": text}
+/// An answer with the body {"error": text}.
 [[nodiscard]] Answer errorAnswer(int status, std::string text);
 
 } // namespace devserver

@@ -36,7 +36,7 @@ std::string chunk(std::string_view type, std::string_view data)
     return bigEndian(static_cast<std::uint32_t>(data.size())) + checked + bigEndian(static_cast<std::uint32_t>(sum));
 }
 
-/// Bytes that don't pack.
+/// Incompressible bytes.
 std::string noise(std::uint64_t seed, std::size_t size)
 {
     std::mt19937_64 generator(seed);

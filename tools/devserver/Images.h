@@ -6,8 +6,8 @@
 
 namespace devserver {
 
-/// A PNG of 96 × 96 pixels, drawn from the identifier: the same one always, and for two different ones hardly ever the
-/// same. It takes `size` bytes, where that is more than the picture needs: the rest is a chunk that readers skip.
+/// A PNG of 96 × 96 pixels that depends on the identifier alone; two identifiers rarely share one. If `size` is more
+/// bytes than the picture needs, a chunk that readers skip fills it up.
 [[nodiscard]] std::string imageFor(std::string_view identifier, std::size_t size = 0);
 
 } // namespace devserver

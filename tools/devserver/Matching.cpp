@@ -13,7 +13,7 @@ struct Query {
     {
         return std::string_view(folded).substr(words[index].begin, words[index].end - words[index].begin);
     }
-    /// A blank behind the last word says that it is complete.
+    /// A blank after the last word means that the word is complete.
     [[nodiscard]] bool lastWordIsOpen() const { return !folded.empty() && folded.back() != ' '; }
 
     std::string lower;
@@ -21,8 +21,8 @@ struct Query {
     std::vector<Word> words;
 };
 
-/// The title from folded position `from` to `to`, in lower case. A character that `from` cuts in two ("ß" after its
-/// first "s") goes on in its folded form.
+/// The title from folded position `from` to `to`, in lower case. If `from` splits a character ("ß" after its first
+/// "s"), the rest of that character is in its folded form.
 std::string titlePart(const Entry& entry, std::size_t from, std::size_t to)
 {
     const Folded& title = entry.foldedTitle;
@@ -42,7 +42,7 @@ std::optional<Match> matchRun(const Entry& entry, const Query& query)
         Match match{&entry, Quality::InsideTitle, {}, {}};
         if (start.begin == entry.titleWords.front().begin)
             match.quality = end == title.size() ? Quality::WholeTitle : Quality::TitleStart;
-        // The word that the query ends in, or the next one where it ends between words.
+        // The word in which the query ends, or the next one if it ends between words.
         const auto last = std::ranges::find_if(entry.titleWords, [&](const Word& word) { return word.end >= end; });
         const std::size_t lastEnd = last == entry.titleWords.end() ? title.size() : last->end;
         match.completion = query.lower + titlePart(entry, end, lastEnd);
@@ -52,7 +52,7 @@ std::optional<Match> matchRun(const Entry& entry, const Query& query)
     return std::nullopt;
 }
 
-/// What follows `prefix` in the first word of the entry that begins with it.
+/// The rest of the entry's first word that starts with `prefix`.
 std::optional<std::string> restOfWord(const Entry& entry, std::string_view prefix)
 {
     for (const Word& word : entry.titleWords) {

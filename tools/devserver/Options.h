@@ -10,12 +10,12 @@ struct Options {
     int httpPort = 8080;
     int httpsPort = 8443;
     std::filesystem::path certificateDirectory; ///< absolute
-    std::filesystem::path readyFile;            ///< empty: none
+    std::filesystem::path readyFile;            ///< empty if not wanted
     bool quiet = false;
     bool verbose = false;
 };
 
-/// Reads the command line. Ends the process for --help and for mistakes, like any command.
+/// Parses the command line. Ends the process for --help and for invalid options.
 [[nodiscard]] Options parseOptions(int argc, char** argv);
 
 } // namespace devserver

@@ -12,20 +12,20 @@
 
 namespace devserver {
 
-/// The requests that came in, in order of arrival, and how many of each kind. Control calls are none. Any thread.
+/// The received requests in order of arrival, and their number by endpoint. Control calls aren't logged. Any thread.
 class RequestLog {
 public:
     static constexpr std::size_t kKept = 1000;
 
-    /// Notes a request as it arrives: before any delay, and before it is answered.
+    /// Logs a request on arrival, before any delay.
     void add(std::string_view endpoint, const Request& request);
     /// The last `count` requests of an endpoint ("" for all) with a number above `since`:
     /// {"requests": [{"number", "time", "endpoint", "method", "path", "query", "headers"}], "last": N}.
     [[nodiscard]] platform::Value list(std::string_view endpoint, std::uint64_t since, std::size_t count) const;
     [[nodiscard]] std::uint64_t total() const;
-    /// {"search": 3, ...}: those that were asked for.
+    /// {"search": 3, ...}: the number of requests by endpoint, without those at 0.
     [[nodiscard]] platform::Value byEndpoint() const;
-    /// Forgets requests and counts; numbers go on.
+    /// Removes requests and counts. Numbers continue.
     void clear();
 
 private:
@@ -41,7 +41,7 @@ private:
     std::deque<Kept> _kept;
 };
 
-/// The first hundred headers as a JSON object, with the values of those that carry credentials hidden.
+/// The first 100 headers as a JSON object. Values of headers with credentials are hidden.
 [[nodiscard]] platform::Value describeHeaders(const Headers& headers);
 
 } // namespace devserver

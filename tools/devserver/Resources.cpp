@@ -16,7 +16,7 @@ using platform::Value;
 
 namespace {
 
-/// Bundle identifiers with their encoding ids. The inner document is JSON text inside the outer one.
+/// Bundle identifiers with their encoding ids. The inner document is JSON text in a string of the outer one.
 std::string appAllowList(std::string_view version)
 {
     platform::Dictionary apps;
@@ -40,7 +40,7 @@ std::string wordList(std::string_view name, std::string_view version)
         Value::dictionaryOf({{"resource", name}, {"version", version}, {"entries", std::move(words)}}));
 }
 
-/// Versions are short and go into file contents and headers: digits alone.
+/// Versions go into file contents and headers, so only short strings of digits are valid.
 bool isVersion(std::string_view text)
 {
     return !text.empty() && text.size() <= 4 && std::ranges::all_of(text, [](char c) { return c >= '0' && c <= '9'; });
@@ -86,7 +86,7 @@ Answer resourceAnswer(std::string_view base, std::string_view path, const Reques
         answer.headers.emplace_back("Location", fmt::format("{0}/resources/hints/{1}/{2}", base, version, path));
         return answer;
     }
-    // hints/VERSION/NAME: the version that clients derive is "VERSION-NAME-hints".
+    // Of the path hints/VERSION/NAME clients derive the version "VERSION-NAME-hints".
     if (path.starts_with("hints/")) {
         const std::string_view rest = path.substr(6);
         const std::string_view version = rest.substr(0, rest.find('/'));

@@ -26,13 +26,13 @@ double scoreOf(const Match& match)
     return static_cast<double>(match.quality) + match.entry->popularity / 1001.0;
 }
 
-/// 0 to 1, by the service's own popularity.
+/// The service's own popularity, from 0 to 1.
 double popularityScore(const Entry& entry)
 {
     return entry.popularity / 1000.0;
 }
 
-/// The most popular first, each text once, and never the query itself.
+/// Suggestions, most popular first, without duplicates and without the query itself.
 Value suggestionsFrom(std::vector<const Match*> matches, std::string_view query)
 {
     std::ranges::stable_sort(matches, std::ranges::greater(), [](const Match* m) { return m->entry->popularity; });
@@ -91,7 +91,7 @@ std::string SearchAnswers::moreUrl(std::string_view query, const Section& sectio
                        section.key, offset);
 }
 
-/// The results grouped by section, the section with the best result first.
+/// Groups results by section; the section with the best result comes first.
 Value SearchAnswers::resultSet(std::string_view query, const std::vector<const Match*>& matches) const
 {
     std::vector<const Section*> order;
@@ -122,7 +122,7 @@ Value SearchAnswers::resultSet(std::string_view query, const std::vector<const M
 Value SearchAnswers::search(std::string_view query, bool withSuggestions) const
 {
     const std::vector<Match> matches = findMatches(_catalogue, query);
-    // Matches of one completion belong together; the completion of the best match comes first.
+    // Matches with the same completion form a set; the set of the best match comes first.
     std::vector<std::pair<std::optional<std::string>, std::vector<const Match*>>> groups;
     for (const Match& match : matches) {
         auto group = std::ranges::find(groups, match.completion, [](const auto& g) { return g.first; });
@@ -156,7 +156,7 @@ Value SearchAnswers::zeroKeyword() const
 
     Value set = resultSet("", pointersTo(best));
     Value::Array sectionList;
-    for (const Value& section : *set["sections"].asArray()) { // there are no further results without a query
+    for (const Value& section : *set["sections"].asArray()) { // without a query there are no more results
         Value copy = section;
         copy.mutableDictionary().remove("more_results_url");
         sectionList.push_back(std::move(copy));
@@ -210,7 +210,7 @@ std::optional<Value> SearchAnswers::card(std::string_view identifier) const
     const Entry* entry = _catalogue.find(identifier);
     if (!entry) return std::nullopt;
     Value found = result(*entry, popularityScore(*entry));
-    Value::Array posters; // by URL and, where that fails, by identifier
+    Value::Array posters; // by URL and, as a fallback, by identifier
     for (const char* view : {"front", "back"})
         posters.push_back(
             Value::dictionaryOf({{"url", fmt::format("{}/images/{}.{}", _base,

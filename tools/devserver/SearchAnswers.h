@@ -11,22 +11,21 @@
 
 namespace devserver {
 
-/// What the service answers from its catalogue: JSON arrays of result sets, without the stamp that `stamp` adds.
-/// Immutable: any thread.
+/// Answers from the catalogue: JSON arrays of result sets, before `stamp`. Immutable, hence any thread.
 class SearchAnswers {
 public:
-    /// `base` is the service's own address over HTTPS. The catalogue must outlive this.
+    /// `base` is the service's own HTTPS address. The catalogue must outlive this.
     SearchAnswers(const Catalogue& catalogue, std::string base) : _catalogue(catalogue), _base(std::move(base)) {}
 
-    /// One set for each of the best completions of the query; one empty set without "query" where nothing fits.
+    /// One set for each of the best completions of the query; one empty set without "query" if nothing matches.
     [[nodiscard]] platform::Value search(std::string_view query, bool withSuggestions = true) const;
-    /// What is popular in every section, and popular queries as suggestions.
+    /// Popular results of every section, and popular queries as suggestions.
     [[nodiscard]] platform::Value zeroKeyword() const;
     /// The next results of one section.
     [[nodiscard]] platform::Value moreResults(std::string_view query, const Section& section, std::size_t offset) const;
     /// Results with "lookup_instructions". `domain` prefers a section by its key.
     [[nodiscard]] platform::Value lookup(std::string_view words, std::string_view domain) const;
-    /// Nothing for an unknown identifier.
+    /// Returns nullopt for an unknown identifier.
     [[nodiscard]] std::optional<platform::Value> card(std::string_view identifier) const;
     [[nodiscard]] platform::Value flights(std::string_view query) const;
 
@@ -39,12 +38,12 @@ private:
     std::string _base;
 };
 
-/// What every result set of an answer carries besides.
+/// Values that `stamp` adds to every result set of an answer.
 struct Stamp {
-    std::string fbq;             ///< opaque; comes back in feedback
+    std::string fbq;             ///< opaque; returned in feedback
     std::string partialClientIp; ///< the client's address without its last part
-    double duration = 0;         ///< milliseconds that the answer took
-    std::uint64_t maxAge = 0;    ///< seconds that a set may be kept; 0 is left out: no limit
+    double duration = 0;         ///< time to make the answer, in milliseconds
+    std::uint64_t maxAge = 0;    ///< how long a set may be cached, in seconds; 0 is left out and means no limit
 };
 void stamp(platform::Value& answer, const Stamp& stamp);
 

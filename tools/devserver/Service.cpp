@@ -20,9 +20,9 @@ constexpr std::string_view kImages = "/images/";
 constexpr std::string_view kResources = "/resources/";
 constexpr std::size_t kMaximumQueryBytes = 2000;
 constexpr std::size_t kMaximumImage = 16u << 20;
-constexpr std::chrono::milliseconds kPace{50}; // of a body without an end
+constexpr std::chrono::milliseconds kPace{50}; // between the blanks of an endless body
 
-/// Faults that hold the request back, before it is answered. False if the peer went meanwhile.
+/// Applies the faults that delay a request. Returns false if the peer left meanwhile.
 bool holdBack(Gate& gate, const std::vector<Fault>& faults, int connection)
 {
     for (const Fault& fault : faults) {
@@ -36,7 +36,7 @@ bool holdBack(Gate& gate, const std::vector<Fault>& faults, int connection)
     return true;
 }
 
-/// The number under `name`; 0 for none.
+/// The number in the query item `name`; 0 if there is none.
 std::size_t numberIn(const Request& request, std::string_view name)
 {
     const std::string text = request.item(name).value_or("0");

@@ -17,20 +17,20 @@
 
 namespace devserver {
 
-/// The search service: one call for each request, on any thread. Knows nothing of sockets.
+/// The search service, without sockets. Any thread.
 class Service {
 public:
-    /// `base` is the service's own address over HTTPS, "https://127.0.0.1:8443".
+    /// `base` is the service's own HTTPS address, "https://127.0.0.1:8443".
     explicit Service(const std::string& base);
 
-    /// Answers a request. Takes as long as the faults that were asked for say.
+    /// Answers a request. Blocks for as long as its faults demand.
     [[nodiscard]] Answer answer(const Request& request);
-    /// Ends all waiting, now and later.
+    /// Ends all delays, now and later.
     void stop() { gate.close(); }
 
     static constexpr std::uint64_t kDefaultMaxAge = 60;
 
-    // What control reads and changes.
+    // Read and changed by control calls.
     const std::string base;
     const Catalogue catalogue;
     Bag bag;
@@ -39,7 +39,7 @@ public:
     Uploads uploads;
     Gate gate;
     std::atomic<std::uint64_t> maxAge = kDefaultMaxAge; ///< seconds; "max_age" of result sets
-    /// Gets a line about every upload. Set before the first request.
+    /// Called with a line about every upload. Set it before the first request.
     std::function<void(const std::string&)> onUpload;
 
 private:
@@ -50,7 +50,7 @@ private:
     std::atomic<std::uint64_t> _searches = 0;
 };
 
-/// The endpoint's name for faults, log and counters; "unknown" for anything that isn't served.
+/// The name of the request's endpoint; "unknown" if it isn't served.
 [[nodiscard]] std::string_view endpointOf(const Request& request);
 
 } // namespace devserver

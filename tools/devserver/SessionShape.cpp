@@ -64,7 +64,7 @@ bool isOneOf(const Value& value, const auto& texts)
     return text && std::ranges::find(texts, *text) != texts.end();
 }
 
-/// A whole number from 0 that was written as one.
+/// Whether the value is a non-negative integer, written as one.
 std::optional<std::uint64_t> count(const Value& value)
 {
     return value.type() == Value::Type::Double ? std::nullopt : value.asUInt();

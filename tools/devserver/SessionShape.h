@@ -7,9 +7,9 @@
 
 namespace devserver {
 
-/// What is wrong with the shape of an uploaded session, at the first place where something is; nothing where it is as
-/// it should be: the keys in their order with values of their types, and events with a known "type" and a "timestamp",
-/// in order of time. A session without "resource_versions" ends before it.
+/// Checks the shape of an uploaded session: its keys in their order with values of their types, and events with a known
+/// "type" and a "timestamp", ordered by time; "resource_versions", the last key, is optional. Returns the first
+/// problem; nullopt if there is none.
 [[nodiscard]] std::optional<std::string> sessionShapeProblem(const platform::Value& session);
 
 } // namespace devserver

@@ -38,7 +38,7 @@ std::optional<std::string> shapeProblem(const Upload& upload)
     return std::nullopt;
 }
 
-/// A text for one line: without control characters.
+/// The text without control characters, for one line.
 std::string oneLine(std::string text)
 {
     for (char& c : text)
@@ -96,7 +96,7 @@ std::string Uploads::add(Upload upload, const Answer& answer)
     const bool taken = answer.status == 200 && !answer.cut;
 
     const std::lock_guard lock(_mutex);
-    // A digest that doesn't fit tells nothing of what came.
+    // A wrong digest doesn't identify the upload.
     Seen none;
     Seen& seen = upload.digestFits ? _seen(*upload.digest) : none;
     const std::uint64_t repeat = seen.received++;

@@ -14,45 +14,45 @@
 
 namespace devserver {
 
-/// An upload, unpacked and checked.
+/// A decompressed and checked upload.
 struct Upload {
     std::string path;
     std::string query;
     std::size_t packedSize = 0;
-    std::size_t size = 0;               ///< bytes of the JSON text; 0 where the body could not be unpacked
-    std::optional<std::string> digest;  ///< as the header has it
-    bool digestFits = false;            ///< it is that of the JSON text
-    platform::Value json;               ///< null where the text is none
-    std::optional<std::string> problem; ///< the first thing that is wrong
+    std::size_t size = 0;               ///< bytes of the JSON text; 0 if the body can't be decompressed
+    std::optional<std::string> digest;  ///< the header's value
+    bool digestFits = false;            ///< whether it is the digest of the JSON text
+    platform::Value json;               ///< null if the text isn't JSON
+    std::optional<std::string> problem; ///< the first problem found
 
-    /// 200, or 400 with the problem.
+    /// 200, or 400 with the problem as its text.
     [[nodiscard]] Answer answer() const;
 };
 
-/// A body must be raw DEFLATE of JSON that fits the "X-Quorvane-Digest" header (SHA-512 of the JSON text, in
-/// hexadecimal). At /feedback the JSON is a session (see `sessionShapeProblem`), elsewhere any object.
+/// Checks an upload. The body must be raw DEFLATE of JSON, and "X-Quorvane-Digest" the SHA-512 of the JSON text in
+/// hexadecimal. At /feedback the JSON must be a session (`sessionShapeProblem`), elsewhere any object.
 [[nodiscard]] Upload checkUpload(const Request& request);
 
-/// What was uploaded: the last ones whole, and counts of all. Any thread.
+/// The received uploads: the last ones whole, and counts of all. Any thread.
 class Uploads {
 public:
     static constexpr std::size_t kKept = 100;
-    /// Digests that are remembered, to tell repeats.
+    /// Digests remembered to recognise repeats.
     static constexpr std::size_t kDigests = 10'000;
 
-    /// Keeps an upload and what it was answered, and answers a line about both for people.
+    /// Stores an upload with its answer; returns a line about both, for people.
     std::string add(Upload upload, const Answer& answer);
     /// [{"number", "path", "query", "size", "packed_size", "digest", "digest_ok", "repeat", "status", "cut", "agent",
-    /// "events", "error", "json"}], oldest first. "repeat" counts earlier uploads with the same digest, whatever those
-    /// were answered; "status" and "cut" are the answer, after faults.
+    /// "events", "error", "json"}], oldest first. "repeat" is the number of earlier uploads with the same digest,
+    /// whatever their answer; "status" and "cut" describe the answer, after faults.
     [[nodiscard]] platform::Value list() const;
-    /// {"received", "taken", "refused", "repeats", "events"}: of all since the start. Taken are those that were
-    /// answered 200, whole; events are those in them, each upload counted once however often it was taken.
+    /// {"received", "taken", "refused", "repeats", "events"}: counts since the start. Taken uploads are those whose
+    /// answer was a whole 200; their events are counted once for each digest.
     [[nodiscard]] platform::Value totals() const;
     void clear();
 
 private:
-    /// How often a digest came, and how often it was taken.
+    /// How often a digest was received, and how often it was taken.
     struct Seen {
         std::uint64_t received = 0, taken = 0;
     };
@@ -70,7 +70,7 @@ private:
     Totals _totals;
     std::map<std::string, Seen> _digests;
     std::deque<std::string> _digestsByAge;
-    std::size_t _keptBytes = 0; // unpacked
+    std::size_t _keptBytes = 0; // decompressed
     std::deque<Kept> _kept;
 };
 

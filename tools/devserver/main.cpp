@@ -21,7 +21,7 @@ namespace {
 
 using namespace devserver;
 
-/// The host of URLs for clients of this machine.
+/// The host in URLs for clients on this machine.
 std::string hostFor(const std::string& address)
 {
     if (address == "0.0.0.0") return "127.0.0.1";
@@ -55,7 +55,7 @@ std::expected<void, std::string> run(const Options& options, const sigset_t& sig
                                                                std::chrono::system_clock::now());
     if (!certificate) return std::unexpected(certificate.error());
 
-    if (!options.readyFile.empty()) { // one that an earlier run left would name the wrong addresses
+    if (!options.readyFile.empty()) { // a file of an earlier run names wrong addresses
         std::error_code ignored;
         std::filesystem::remove(options.readyFile, ignored);
     }
@@ -98,7 +98,7 @@ std::expected<void, std::string> run(const Options& options, const sigset_t& sig
                        service.catalogue.entries().size(), base, certificate->certificate.string());
             service.onUpload = printUpload;
         }
-        http.start(handler); // now, so that the line of JSON is the first
+        http.start(handler); // after the line of JSON, which must be the first
         https.start(handler);
         int signal = 0;
         sigwait(&signals, &signal);
@@ -114,13 +114,13 @@ std::expected<void, std::string> run(const Options& options, const sigset_t& sig
 int main(int argc, char** argv)
 {
     const Options options = parseOptions(argc, argv);
-    // Blocked before the first thread, so that only this one takes them.
+    // Blocked before the first thread starts, so that only sigwait takes them.
     sigset_t signals;
     sigemptyset(&signals);
     sigaddset(&signals, SIGINT);
     sigaddset(&signals, SIGTERM);
     pthread_sigmask(SIG_BLOCK, &signals, nullptr);
-    std::signal(SIGPIPE, SIG_IGN); // whoever read the first line may be gone when there is another
+    std::signal(SIGPIPE, SIG_IGN); // the reader of the first line may have gone before the next
     try {
         const auto result = run(options, signals);
         if (result) return 0;
