@@ -28,7 +28,7 @@ constexpr std::size_t kMaximumApplications = 10'000;
 constexpr int kMaximumDepth = 4;
 constexpr std::size_t kMaximumFolders = 1'000; // below one data directory, as the next
 constexpr std::size_t kMaximumNames = 100'000;
-/// Each takes one of the inotify instances of which a user has, by default, 128.
+/// The watches of all processes of a user have a common limit.
 constexpr std::size_t kMaximumWatches = 32;
 constexpr std::size_t kMaximumEntrySize = 1u << 20;
 constexpr std::size_t kMaximumMetadataSize = 4u << 20;
