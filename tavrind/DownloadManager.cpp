@@ -257,7 +257,7 @@ void DownloadManager::_downloadResource(const DownloadResource& resource, const 
 {
     UrlRequest request = _createDownloadRequest(resource, url);
     log().log("starting download of {} reason: {} delay: {:f} headers: {}", url.string(), reason,
-              platform::toSeconds(_delay()), textOf(request.headers));
+              platform::toSeconds(_delay()), platform::Private{textOf(request.headers)}); // they may tell the place
     const auto task = _assembly.downloadURLSession->downloadTask(std::move(request));
     if (!task) return log().error("download task error {}", task.error().description());
     (*task)->setNote(url.string()); // the request's URL has the service's items too
