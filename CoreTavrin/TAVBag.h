@@ -17,24 +17,26 @@ namespace tavrin {
 ///
 /// Every accessor reads the top-level key of its own name. A dictionary under "clients" holds, by client name, keys
 /// that override the top level; the name that `extractClientNameFromString` finds in the user agent applies. A key that
-/// is missing or of the wrong type reads as its default. docs/bag.md lists every key.
+/// is missing, or whose value has the wrong type, reads as its default. docs/bag.md lists every key.
 ///
-/// Immutable and cheap to copy: any thread.
+/// Immutable, and cheap to copy: the raw bag is shared. Any thread.
 class TAVBag {
 public:
-    /// Wraps a raw bag, which must be a dictionary (anything else reads as an empty one).
+    /// Wraps a raw bag, a dictionary; anything else reads as an empty one.
     TAVBag(platform::Value rawBag, std::string userAgent);
 
     [[nodiscard]] const platform::Value& rawBag() const { return _rawBag; }
     [[nodiscard]] const std::string& userAgent() const { return _userAgent; }
 
-    [[nodiscard]] std::string version() const;  ///< a string, or a number read as one; ""
-    [[nodiscard]] bool isEnabled() const;       ///< true
-    [[nodiscard]] bool feedbackEnabled() const; ///< true
-    /// UTF-16 units; 1.
+    [[nodiscard]] std::string version() const;  ///< a number reads as its text; default ""
+    [[nodiscard]] bool isEnabled() const;       ///< default true
+    [[nodiscard]] bool feedbackEnabled() const; ///< default true
+    /// In UTF-16 units; default 1.
     [[nodiscard]] std::uint64_t minimumQueryLength() const;
-    /// Seconds, above 0; none.
+    /// In seconds, above 0; no default.
     [[nodiscard]] std::optional<double> timeoutIntervalForRequest() const;
+
+    // URLs are absolute, with http or https; without default.
 
     [[nodiscard]] std::optional<platform::Url> searchURL() const;
     [[nodiscard]] std::optional<platform::Url> warmURL() const;
@@ -46,12 +48,13 @@ public:
     /// The URL of a downloadable resource, by the resource's identifier.
     [[nodiscard]] std::optional<platform::Url> resourceURL(std::string_view identifier) const;
 
-    [[nodiscard]] bool sendGeoEnvironmentHeader() const;                        ///< false
-    [[nodiscard]] std::vector<std::string> supportedGeoLocationSources() const; ///< of "gps", "cell", "wifi"; none
-    [[nodiscard]] std::optional<bool> hashtagImagesVisible() const;             ///< none: leave as it is
+    [[nodiscard]] bool sendGeoEnvironmentHeader() const; ///< default false
+    [[nodiscard]] std::vector<std::string>
+    supportedGeoLocationSources() const;                            ///< of "gps", "cell", "wifi"; default none
+    [[nodiscard]] std::optional<bool> hashtagImagesVisible() const; ///< nothing: leave it as it is
     [[nodiscard]] std::optional<std::vector<std::string>> subscriptionProviderDomainWhitelist() const;
     [[nodiscard]] std::optional<std::vector<std::string>> subscriptionProviderBundleIdentifierWhitelist() const;
-    [[nodiscard]] double subscriptionTTL() const; ///< seconds; 86400
+    [[nodiscard]] double subscriptionTTL() const; ///< in seconds, above 0; default 86400
 
     /// One text for each key, at the top level or in a client's view, whose value has the wrong type.
     [[nodiscard]] std::vector<std::string> problems() const;
@@ -81,7 +84,7 @@ inline constexpr std::string_view kTAVCrowdsourcingWhitelist = "TAVCrowdsourcing
 /// Identifiers of the downloadable resources, in the order in which they are processed.
 extern const std::vector<std::string_view> kTAVResourceIdentifiers;
 
-/// A bag on its way over IPC.
+/// A bag as it crosses IPC.
 struct TAVBagRecord : platform::RecordOf<TAVBagRecord> {
     static constexpr std::string_view kClass = "TAVBag";
     platform::Bytes rawBag; ///< JSON text
@@ -89,7 +92,7 @@ struct TAVBagRecord : platform::RecordOf<TAVBagRecord> {
 
     TAVBagRecord() = default;
     explicit TAVBagRecord(const TAVBag& bag);
-    /// None if the text is no JSON object.
+    /// The bag; null if the text is no JSON object.
     [[nodiscard]] std::shared_ptr<const TAVBag> bag() const;
     static constexpr auto fields()
     {
