@@ -37,7 +37,13 @@ namespace {
 
 constexpr double kTrustedForSeconds = 14400;
 constexpr double kStaleAheadSeconds = 600;
-constexpr std::size_t kMaximumBagSize = 16u << 20;
+/// How far the clock may go back, as when it is set by a little, before a fresh bag counts as one of another time.
+constexpr double kClockTolerance = 1;
+constexpr std::size_t kMaximumBagSize = 8u << 20;
+/// How long a fetch may take in all: while one is under way none other begins.
+constexpr platform::Duration kFetchLimit = std::chrono::minutes(2);
+constexpr platform::Duration kFirstAnnouncementInterval = std::chrono::minutes(1);
+constexpr platform::Duration kLongestAnnouncementInterval = std::chrono::hours(4);
 constexpr const char* kExpirationKey = "__expiration";
 constexpr const char* kBagUrlKey = "__bagurl";
 constexpr const char* kNewsUserAgent = "news/1.0";
@@ -53,8 +59,9 @@ const platform::Log& log()
 BagStaleness bagStaleness(std::optional<double> expiration, const std::string* cachedUrl, platform::Date now,
                           const std::function<std::string()>& currentUrl)
 {
-    // A NaN compares false: such an expiration is stale too.
-    if (!(expiration.value_or(0) - platform::secondsSince1970(now) >= kStaleAheadSeconds)) return BagStaleness::Expired;
+    // With more time left than a fetch gives, the clock was wrong then or is now. A NaN compares false: stale, too.
+    const double left = expiration.value_or(0) - platform::secondsSince1970(now);
+    if (!(left >= kStaleAheadSeconds && left <= kTrustedForSeconds + kClockTolerance)) return BagStaleness::Expired;
     if (!cachedUrl) return BagStaleness::NoUrl;
     return *cachedUrl == currentUrl() ? BagStaleness::Fresh : BagStaleness::UrlChanged;
 }
@@ -84,6 +91,20 @@ bool versionPrecedes(std::string_view a, std::string_view b)
     return a.size() < b.size();
 }
 
+bool AnnouncedVersion::take(std::string_view version, std::uint64_t now)
+{
+    if (versionPrecedes(_version, version)) {
+        _version = version;
+        _interval = kFirstAnnouncementInterval;
+    } else if (now < _due) {
+        return false;
+    } else {
+        _interval = std::min(2 * _interval, kLongestAnnouncementInterval);
+    }
+    _due = now + static_cast<std::uint64_t>(_interval.count());
+    return true;
+}
+
 /// One fetch, from its request to its completion.
 struct TavrinBagController::Fetch {
     platform::Transactions::Token transaction; // keeps the process alive until the end
@@ -92,6 +113,8 @@ struct TavrinBagController::Fetch {
     std::string userGuid;
     Value timingData;
     Completion completion;
+    platform::Clock::TimerId limit = 0;
+    std::atomic<bool> tookTooLong = false;
 };
 
 std::shared_ptr<TavrinBagController> TavrinBagController::make(Assembly& assembly)
@@ -166,7 +189,10 @@ void TavrinBagController::forceFetchBag(const Value& announcement)
     const auto bag = inMemoryBag();
     if (!bag || !announced.isNumber()) return;
     const std::string version = platform::toJson(announced);
-    if (versionPrecedes(bag->version(), version)) _fetchBagStateWithVersion(version);
+    if (_fetchInProgress || !versionPrecedes(bag->version(), version)) return;
+    const std::uint64_t now = _assembly.device.clock.hostTicks();
+    if (_inMemoryBagCacheAccessQueue->barrierSync([&] { return _announced.take(version, now); }))
+        _fetchBagStateWithVersion(version);
 }
 
 std::string TavrinBagController::_bagCacheURL()
@@ -286,7 +312,8 @@ void TavrinBagController::_fetchBagStateWithVersion(const std::string& version)
 
 void TavrinBagController::_fetchBagStateWithVersion(const std::string& version, Completion completion)
 {
-    const platform::UrlRequest request = _assembly.requestFactory->bagFetchRequest(*this, _userAgent, version);
+    platform::UrlRequest request = _assembly.requestFactory->bagFetchRequest(*this, _userAgent, version);
+    request.maximumResponseSize = kMaximumBagSize;
     log().debug("Initiating bag fetch attempt with request {} header {}", request.url.string(),
                 describe(request.headers));
 
@@ -308,7 +335,20 @@ void TavrinBagController::_fetchBagStateWithVersion(const std::string& version, 
                 return;
             }
             fetch->timingData = std::move(timingData);
+            if (fetch->tookTooLong && error)
+                error = Error::withReason(std::string(platform::kUrlErrorDomain), platform::kUrlTimedOut, "timed out");
             self->_fetchCompleted(*fetch, std::move(data), std::move(response), std::move(error));
+        });
+    fetch->limit =
+        _assembly.device.clock.after(kFetchLimit, [fetch = std::weak_ptr(fetch), task = std::weak_ptr(task),
+                                                   queue = _assembly.device.globalQueue(platform::Priority::Default)] {
+            queue->async([fetch, task] {
+                const auto late = fetch.lock();
+                const auto running = task.lock();
+                if (!late || !running) return;
+                late->tookTooLong = true;
+                running->cancel();
+            });
         });
     task->resume();
 }
@@ -316,6 +356,7 @@ void TavrinBagController::_fetchBagStateWithVersion(const std::string& version, 
 void TavrinBagController::_fetchCompleted(Fetch& fetch, std::optional<platform::Bytes> data,
                                           std::optional<platform::UrlResponse> response, std::optional<Error> error)
 {
+    _assembly.device.clock.cancel(fetch.limit);
     const auto addFeedback = [&](std::shared_ptr<ZRFeedback> record) {
         record->timestamp = _assembly.device.clock.hostTicks();
         fetch.session->addFeedback(std::make_shared<TavrinFeedback>(std::move(record), 0, fetch.userGuid, _userAgent));

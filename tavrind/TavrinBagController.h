@@ -36,23 +36,37 @@ inline constexpr const char* kNewsDisabledNotifyName = "com.quorvane.tavrin.news
 /// Why a cached bag must be fetched again.
 enum class BagStaleness { Fresh, Expired, NoUrl, UrlChanged };
 
-/// `expiration`: the moment the bag stops being trusted, none counts as 1970; it is stale 600 s before. `cachedUrl`:
-/// what the bag cache request's URL was when the bag was fetched; `currentUrl` makes it anew, and is called only if it
-/// counts.
+/// Decides by time, then by URL. `expiration` is the moment from which the bag is no longer trusted, in seconds since
+/// 1970; none counts as 1970. The bag has expired from 600 s before that moment on, and while that moment is more than
+/// four hours ahead, which no fetch makes it. `cachedUrl` is the bag cache request's URL at the time of the fetch;
+/// `currentUrl` makes the one of now, and is called only if the time doesn't decide.
 [[nodiscard]] BagStaleness bagStaleness(std::optional<double> expiration, const std::string* cachedUrl,
                                         platform::Date now, const std::function<std::string()>& currentUrl);
 
 /// Orders version texts with runs of digits compared as numbers: "9" before "10".
 [[nodiscard]] bool versionPrecedes(std::string_view a, std::string_view b);
 
+/// When to fetch for a version that the service announces and that doesn't come with the next bag: the first time at
+/// once, then again at intervals that double from one minute to four hours. A higher version is new. Not thread-safe.
+class AnnouncedVersion {
+public:
+    /// Whether to fetch for `version` at `now`, in host ticks. If so, that counts as done.
+    [[nodiscard]] bool take(std::string_view version, std::uint64_t now);
+
+private:
+    std::string _version;
+    platform::Duration _interval{};
+    std::uint64_t _due = 0;
+};
+
 /// Fetches the bag, keeps one copy in memory and one on disk, and tells the daemon when there is a new one.
 ///
-/// Life: the copy on disk, stale or not, is there from the start. A bag is stale 3 h 50 min after its fetch, or when
-/// the URL that it was fetched from would be another now; whoever reads a stale bag still gets it, and starts a fetch.
-/// One fetch runs at a time, further ones are dropped. A failed fetch leaves the bag as it was; there is no timer, the
-/// next reading tries again.
+/// Life: the copy on disk, stale or not, is used from the start. A bag is stale from 3 h 50 min after its fetch on, and
+/// when the URL that it was fetched from would be another now; whoever reads a stale bag gets it, and starts a fetch.
+/// One fetch runs at a time, for two minutes at most; further ones are dropped. A failed fetch leaves the bag as it
+/// was. No timer repeats it: the next reading of the stale bag does.
 ///
-/// Any thread.
+/// Any thread. The assembly must outlive it.
 class TavrinBagController : public std::enable_shared_from_this<TavrinBagController> {
 public:
     /// Reads the disk cache, and observes TAVBagRefreshRequired of the assembly's request factory.
@@ -71,7 +85,8 @@ public:
     [[nodiscard]] std::shared_ptr<const TAVBag> inMemoryBag() const;
     [[nodiscard]] std::optional<platform::Url> warmURL();
 
-    /// The service announces a bag version, a number under "bag": fetched if the bag at hand precedes it.
+    /// Fetches the version that the service announces, a number under "bag", if the bag in memory precedes it and
+    /// `AnnouncedVersion` agrees. Does nothing without a bag or a number.
     void forceFetchBag(const platform::Value& announcement);
 
     [[nodiscard]] bool fetchInProgress() const { return _fetchInProgress; }
@@ -95,6 +110,7 @@ private:
 
     Assembly& _assembly;
     std::shared_ptr<const TAVBag> _inMemoryBag; // on _inMemoryBagCacheAccessQueue
+    AnnouncedVersion _announced;                // on _inMemoryBagCacheAccessQueue
     std::shared_ptr<platform::Queue> _inMemoryBagCacheAccessQueue;
     std::string _userAgent;
     std::atomic<bool> _fetchInProgress = false;

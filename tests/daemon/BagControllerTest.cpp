@@ -4,7 +4,7 @@
 #include "platform/values/PropertyList.h"
 #include "tavrind/TAVNetworkRequestFactory.h"
 #include "tavrind/TavrinBagController.h"
-#include "tests/support/DaemonFixture.h"
+#include "tests/support/FeedbackFixture.h"
 
 namespace tavrin::test {
 namespace {
@@ -25,7 +25,9 @@ TEST(BagStaleness, IsDecidedByTimeThenByUrl)
     EXPECT_EQ(bagStaleness(1000601, nullptr, now, same), BagStaleness::NoUrl);
     EXPECT_EQ(bagStaleness(std::nullopt, &url, now, same), BagStaleness::Expired);
     EXPECT_EQ(bagStaleness(NAN, &url, now, same), BagStaleness::Expired);
-    EXPECT_EQ(bagStaleness(1e300, &url, now, same), BagStaleness::Fresh);
+    EXPECT_EQ(bagStaleness(1014400, &url, now, same), BagStaleness::Fresh) << "just fetched";
+    EXPECT_EQ(bagStaleness(1014402, &url, now, same), BagStaleness::Expired) << "fetched in the future";
+    EXPECT_EQ(bagStaleness(1e300, &url, now, same), BagStaleness::Expired);
 }
 
 TEST(BagVersion, ComparesNumbersAsNumbers)
@@ -41,16 +43,33 @@ TEST(BagVersion, ComparesNumbersAsNumbers)
     EXPECT_FALSE(versionPrecedes("10", "010"));
 }
 
+TEST(BagVersion, OneThatDoesNotComeIsAskedForLessAndLessOften)
+{
+    AnnouncedVersion announced;
+    const auto at = [&](const char* version, std::chrono::minutes now) {
+        return announced.take(version, static_cast<std::uint64_t>(platform::Duration(now).count()));
+    };
+    const std::tuple<const char*, int, bool> steps[]{
+        {"10", 0, true},  {"10", 0, false}, {"9", 0, false},    {"10", 1, true},    {"10", 2, false},
+        {"10", 3, true},  {"10", 6, false}, {"10", 7, true},    {"11", 7, true},    {"11", 7, false},
+        {"10", 7, false}, {"11", 8, true},  {"11", 1000, true}, {"11", 1003, false}};
+    for (const auto& [version, minute, fetched] : steps)
+        EXPECT_EQ(at(version, std::chrono::minutes(minute)), fetched) << version << " at " << minute;
+    for (int day = 1; day < 20; ++day) (void)at("11", day * 24h);
+    EXPECT_FALSE(at("11", 19 * 24h + 239min));
+    EXPECT_TRUE(at("11", 19 * 24h + 240min)) << "four hours at most";
+}
+
 struct BagControllerTest : DaemonTest {
     TavrinBagController& controller() { return *assembly().bagController; }
     int announced = 0;
-    std::vector<std::string> errors;
+    std::vector<platform::Error> errors;
     platform::NotificationCenter::Token token =
         device.notifications.observe(TAVBagChangeNotification, [this](const platform::Notification& notification) {
             if (notification.get<std::shared_ptr<const TAVBag>>("bag"))
                 ++announced;
             else
-                errors.push_back(notification.get<platform::Error>("bagError").reason());
+                errors.push_back(notification.get<platform::Error>("bagError"));
         });
 };
 
@@ -104,14 +123,18 @@ TEST_F(BagControllerTest, FailedFetchesLeaveTheOldBag)
         {[&] { lastTask()->respond(200, std::string(10000, '[')); }, nullptr},
         {[&] { lastTask()->respond(200, "{\"a\": \"\xff\"}"); }, nullptr},
     };
-    for (const auto& [fault, reason] : faults) {
-        controller().forceFetchBag(Value::dictionaryOf({{"bag", 100}}));
+    for (int version = 100; const auto& [fault, reason] : faults) {
+        controller().forceFetchBag(Value::dictionaryOf({{"bag", ++version}}));
         errors.clear();
         fault();
         device.drain();
         ASSERT_EQ(errors.size(), 1u);
         if (reason) {
-            EXPECT_EQ(errors[0], reason);
+            EXPECT_EQ(errors[0].reason(), reason);
+        }
+        if (reason && reason != std::string("timed out")) {
+            EXPECT_EQ(errors[0].domain, "TAVErrorDomain");
+            EXPECT_EQ(errors[0].code, 2);
         }
         EXPECT_EQ(controller().inMemoryBag()->version(), "9");
     }
@@ -228,9 +251,66 @@ TEST_F(BagControllerTest, ClockChangesNeverLoseTheBag)
         device.clock.setWall(device.clock.wallNow() + years * 365 * 24h);
         EXPECT_EQ(controller().currentBag()->version(), "9");
         device.drain();
-        if (years > 0) deliverBag();
+        deliverBag();
     }
-    EXPECT_EQ(tasks().size(), 2u) << "expired only when the clock went forward";
+    EXPECT_EQ(tasks().size(), 3u) << "a bag of another time is fetched anew";
+}
+
+TEST_F(BagControllerTest, AnAnnouncedVersionThatNeverComesIsFetchedOnce)
+{
+    start();
+    deliverBag();
+    for (int answer = 0; answer < 3; ++answer) {
+        controller().forceFetchBag(Value::dictionaryOf({{"bag", 100}}));
+        if (!lastTask()->finished) deliverBag();
+    }
+    EXPECT_EQ(tasks().size(), 2u);
+    device.advance(1min);
+    controller().forceFetchBag(Value::dictionaryOf({{"bag", 100}}));
+    EXPECT_EQ(tasks().size(), 3u);
+}
+
+TEST_F(BagControllerTest, AFetchThatNeverEndsIsGivenUp)
+{
+    start();
+    EXPECT_EQ(lastTask()->originalRequest().maximumResponseSize, 8u << 20);
+    device.advance(119s);
+    device.drain();
+    EXPECT_TRUE(errors.empty());
+    device.advance(1s);
+    device.drain();
+    ASSERT_EQ(errors.size(), 1u);
+    EXPECT_EQ(errors[0].code, platform::kUrlTimedOut);
+    EXPECT_FALSE(controller().currentBag());
+    EXPECT_EQ(tasks().size(), 2u) << "another may begin";
+    deliverBag();
+    EXPECT_EQ(controller().currentBag()->version(), "9");
+}
+
+using BagFeedbackTest = FeedbackTest;
+
+TEST_F(BagFeedbackTest, AFetchIsASessionOfItsOwn)
+{
+    const auto fetched = [&](int status) {
+        startWithoutBag();
+        deliverBag(kFeedbackBag);
+        upload();
+        const auto before = allUploads().size();
+        device.clock.setWall(device.clock.wallNow() + 14400s);
+        (void)assembly().bagController->currentBag();
+        device.drain();
+        respond(kFeedbackBag, status);
+        upload();
+        EXPECT_EQ(allUploads().size(), before + 1);
+        return decoded(*allUploads().back());
+    };
+    const Value session = fetched(200);
+    EXPECT_EQ(typesIn(session), (std::vector<std::string>{"network_search_start", "network_search_end"}));
+    EXPECT_EQ(session["fb"][0]["input"], Value(""));
+    EXPECT_EQ(session["fb"][0]["trigger_event"], Value("bag"));
+    EXPECT_EQ(session["fb"][0]["endpoint_type"], Value("tavrin_bag"));
+    EXPECT_EQ(session["agent"], Value("tavrind/0.1.0"));
+    EXPECT_EQ(typesIn(fetched(500)).back(), "error");
 }
 
 } // namespace
