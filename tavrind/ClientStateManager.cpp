@@ -19,7 +19,9 @@ using platform::Value;
 
 namespace {
 constexpr const char* kSessionsKey = "sessions";
-}
+/// Client identifiers known at once. States live as long as the daemon, and each takes about 6 KB.
+constexpr std::size_t kMaximumStates = 1024;
+} // namespace
 
 std::shared_ptr<ClientStateManager> ClientStateManager::make(Assembly& assembly)
 {
@@ -50,11 +52,15 @@ std::shared_ptr<ClientState> ClientStateManager::stateForClientIdentifier(const 
         log.fault("client session identifier cannot be nil or empty");
         return nullptr;
     }
-    auto state = stateCacheQueue->sync([&] {
-        std::shared_ptr<ClientState>& slot = stateCache[*identifier];
-        if (!slot) slot = std::make_shared<ClientState>(*identifier, _assembly);
-        return slot;
+    auto state = stateCacheQueue->sync([&]() -> std::shared_ptr<ClientState> {
+        if (const auto known = stateCache.find(*identifier); known != stateCache.end()) return known->second;
+        if (stateCache.size() >= kMaximumStates) return nullptr;
+        return stateCache[*identifier] = std::make_shared<ClientState>(*identifier, _assembly);
     });
+    if (!state) {
+        log.fault("{} clients are known; another is refused", kMaximumStates);
+        return nullptr;
+    }
     log.info("using client state: {}", *identifier);
     return state;
 }

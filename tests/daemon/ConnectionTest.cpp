@@ -232,6 +232,15 @@ TEST_F(ConnectionTest, TheEndpointServesMoreResultsAndCardsAlone)
     EXPECT_TRUE(images->answered());
 }
 
+TEST_F(ConnectionTest, NoClientMakesTheDaemonKnowIdentifiersWithoutEnd)
+{
+    ASSERT_FALSE(client("com.example.early")->invalidated());
+    for (int i = 0; i < 1024; ++i)
+        (void)assembly().clientStateManager->stateForClientIdentifier("com.example." + std::to_string(i));
+    EXPECT_TRUE(client("com.example.late")->invalidated());
+    EXPECT_FALSE(client("com.example.early")->invalidated());
+}
+
 TEST_F(ConnectionTest, CountsConnectionsAndTheirEnds)
 {
     platform::test::LogCapture log;
