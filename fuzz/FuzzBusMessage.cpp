@@ -33,7 +33,7 @@ constexpr std::size_t kSafeDepth = 20;
 } // namespace
 
 /// A dictionary from one end to the other, read from JSON with bytes and dates as `fuzz::enriched` has them. What is
-/// written is read as the same, at the size that was counted, and is refused one byte below.
+/// written is read as the same, and is refused one byte below its size in memory.
 int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
 {
     const auto json = parseJson(textOf(data, size));
@@ -43,9 +43,7 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
     const auto message = newMessage();
     const auto written = ipc::encodeArguments(message.get(), "a{sv}", {.args = {value}, .handles = {}});
     if (!written) {
-        check(!written.error().empty() &&
-                  (fuzz::anyOf(value, fuzz::hasNullElement) || fuzz::depthOf(value) > kSafeDepth),
-              written.error());
+        check(!written.error().empty() && fuzz::depthOf(value) > kSafeDepth, written.error());
         return 0;
     }
     check(sd_bus_message_seal(message.get(), 1, 0) >= 0);
@@ -53,10 +51,6 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
     check(read.has_value(), read ? "" : read.error().message);
     check(read->message.args.size() == 1 && read->message.args[0] == fuzz::arriving(value), toJson(value));
 
-    const auto isRepaired = [](const Value& text) {
-        return text.asString() && ipc::busText(*text.asString()) != *text.asString();
-    };
-    check(*written == read->size || fuzz::anyOf(value, isRepaired), std::to_string(*written));
     sd_bus_message_rewind(message.get(), true);
     check(ipc::decodeArguments(message.get(), read->size).has_value());
     sd_bus_message_rewind(message.get(), true);

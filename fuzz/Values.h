@@ -48,7 +48,8 @@ inline Value arriving(const Value& value)
     if (const std::string* text = value.asString()) return platform::ipc::busText(*text);
     if (const Value::Array* array = value.asArray()) {
         Value::Array elements;
-        for (const Value& element : *array) elements.push_back(arriving(element));
+        for (const Value& element : *array)
+            elements.push_back(element.isNull() ? Value(platform::Dictionary()) : arriving(element));
         return elements;
     }
     if (const platform::Dictionary* dictionary = value.asDictionary()) {
@@ -68,13 +69,6 @@ inline std::size_t depthOf(const Value& value)
     if (const platform::Dictionary* dictionary = value.asDictionary())
         for (const auto& [key, entry] : *dictionary) deepest = std::max(deepest, depthOf(entry) + 1);
     return deepest;
-}
-
-/// Such an array can't travel.
-inline bool hasNullElement(const Value& value)
-{
-    const Value::Array* array = value.asArray();
-    return array && std::ranges::any_of(*array, &Value::isNull);
 }
 
 /// Whether `leaf` holds for every value of two trees that have the same arrays, keys and leaves.

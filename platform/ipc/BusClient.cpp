@@ -31,8 +31,8 @@ std::uint64_t microseconds(Duration duration)
     return count > 0 ? static_cast<std::uint64_t>(count) : 0;
 }
 
-/// Waits until there is something for the bus to do, `descriptor` can be read (-1: there is none), a signal was handled
-/// or the deadline has passed; false when there is no waiting.
+/// Waits until the bus has something to do, `descriptor` can be read (-1 for none), a signal was handled, or the
+/// deadline has passed. Returns false if it can't wait.
 bool waitForInput(sd_bus* bus, int descriptor, std::uint64_t now, std::uint64_t deadline)
 {
     const int events = sd_bus_get_events(bus);
@@ -151,7 +151,10 @@ void Client::call(std::string_view interface, const Member& member, Message argu
                                                 interfaceName.c_str(), name.c_str());
     const BusMessage message(raw);
     if (result < 0) return fail(std::strerror(-result));
-    if (auto encoded = encodeArguments(raw, member.in, arguments); !encoded) return fail(encoded.error());
+    const auto encoded = encodeArguments(raw, member.in, arguments);
+    if (!encoded) return fail(encoded.error());
+    // The service would drop the connection.
+    if (*encoded > Limits().messageSize) return fail(fmt::format("{} bytes are more than a call may have", *encoded));
 
     if (!answer) {
         result = sd_bus_message_set_expect_reply(raw, false);

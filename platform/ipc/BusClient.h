@@ -10,7 +10,7 @@
 
 namespace platform::ipc {
 
-/// The caller's end: a blocking client for one thread, with calls that may be outstanding side by side.
+/// The caller's end of a connection. Belongs to one thread; several calls may be under way at once.
 class Client {
 public:
     /// Connects to a D-Bus address ("unix:path=…"); calls go to the object at `objectPath`.
@@ -19,13 +19,14 @@ public:
     ~Client();
 
     using Answer = std::function<void(CallResult)>;
-    /// Sends a call; `answer` runs inside a later `wait`. With a `timeout` it gets a time-out error after that.
+    /// Sends a call. `answer`, if any, gets the answer inside a later `wait`, or an error: one of the service, one if
+    /// the call couldn't be sent, or one after `timeout`. A connection that ends drops the answers that are due.
     void call(std::string_view interface, const Member& member, Message arguments, Answer answer,
               std::optional<Duration> timeout = std::nullopt);
-    /// Handles signals inside `wait`: interface, member, arguments.
+    /// Sets the handler of signals, which `wait` calls: interface, member, arguments.
     void onSignal(std::function<void(std::string_view, std::string_view, Message)> handler);
-    /// Reads and dispatches until `done()` is true, the connection ends (false) or `timeout` passes (false). `done` is
-    /// asked again after whatever arrives, and whenever `descriptor` can be read: it reads it then.
+    /// Reads and dispatches until `done()` returns true; returns false if the connection ends or `timeout` passes
+    /// before. `done` is called after whatever arrives, and whenever `descriptor` can be read, which it must read then.
     bool wait(const std::function<bool()>& done, Duration timeout, int descriptor = -1);
     [[nodiscard]] bool connected() const;
 

@@ -5,6 +5,7 @@
 #include <cstring>
 #include <poll.h>
 #include <sys/epoll.h>
+#include <sys/socket.h>
 
 #include <fmt/format.h>
 #include <systemd/sd-bus.h>
@@ -18,11 +19,17 @@ namespace {
 
 const Log kLog("platform", "ipc");
 
-/// Messages taken from one connection before the others, and the loop's jobs, have their turn.
-constexpr unsigned kMessagesPerTurn = 32;
+/// Steps, of which a message takes one or two, before other connections and the loop's jobs have their turn.
+constexpr unsigned kStepsPerTurn = 64;
 
-/// What a message costs besides its arguments, roughly: its header and sd-bus's own record of it.
+/// What a message costs besides its bytes, roughly: sd-bus's own record of it.
 constexpr std::size_t kMessageOverhead = 512;
+
+/// A message that is let in however much is held already: everybody may have a call under way.
+constexpr std::size_t kSmallMessage = 4u << 10;
+
+/// What the decoded arguments of a message may take, in sizes of the message.
+constexpr std::size_t kDecodedShare = 2;
 
 bool isDisconnect(int result)
 {
@@ -30,7 +37,7 @@ bool isDisconnect(int result)
            result == -ESTALE;
 }
 
-/// Why sd-bus gave up, for `end`: a peer's going needs no words.
+/// Why sd-bus failed, for `end`; empty if the peer just went.
 std::string_view describe(int result)
 {
     return isDisconnect(result) ? std::string_view() : std::strerror(-result);
@@ -38,7 +45,29 @@ std::string_view describe(int result)
 
 } // namespace
 
-/// What the connection's owner holds: every wish becomes a job on the loop.
+void BusContext::hold(pid_t process, std::size_t before, std::size_t now)
+{
+    held += now - before;
+    processes[process].bytes += now - before;
+    if (now >= before || !std::exchange(starved, false)) return;
+    for (const auto& connection : connections) connection->driveAgainLater();
+}
+
+bool BusContext::full(pid_t process)
+{
+    const bool isFull = held >= limits.bytes || processes[process].bytes >= limits.bytesPerProcess;
+    starved |= isFull;
+    return isFull;
+}
+
+bool BusContext::admits(pid_t process, std::size_t bytes)
+{
+    const bool admitted = held + bytes <= limits.bytes && processes[process].bytes + bytes <= limits.bytesPerProcess;
+    starved |= !admitted;
+    return admitted;
+}
+
+/// What the connection's owner holds: hands every operation to the loop.
 class BusConnection::Handle final : public Connection {
 public:
     explicit Handle(std::shared_ptr<BusConnection> core) : _core(std::move(core)) {}
@@ -108,7 +137,7 @@ std::shared_ptr<Connection> BusConnection::handle()
     return std::make_shared<Handle>(shared_from_this());
 }
 
-// MARK: - the owner's wishes
+// MARK: - the owner's operations
 
 void BusConnection::start()
 {
@@ -130,8 +159,15 @@ void BusConnection::start()
                 return static_cast<BusConnection*>(self)->onMessage(message);
             },
             this);
-    if (result >= 0) result = sd_bus_set_fd(bus, _socket.fd(), _socket.fd());
-    if (result >= 0) _fd = _socket.release();
+    int pair[2] = {-1, -1};
+    if (result >= 0 && socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0, pair) != 0) result = -errno;
+    FileHandle input(pair[0]);
+    _input.emplace(_socket.fd(), FileHandle(pair[1]));
+    if (result >= 0) result = sd_bus_set_fd(bus, input.fd(), _socket.fd());
+    if (result >= 0) {
+        (void)input.release();
+        _fd = _socket.release();
+    }
     if (result >= 0) result = sd_bus_start(bus);
     if (result < 0) return end(describe(result));
 
@@ -140,7 +176,7 @@ void BusConnection::start()
     _watch = _context->loop.watch(_fd, _watchedEvents, [weak = weak_from_this()](std::uint32_t events) {
         if (auto self = weak.lock()) self->ready(events);
     });
-    drive(false);
+    drive(true);
 }
 
 void BusConnection::push(std::string_view signal, const Message& arguments)
@@ -173,8 +209,7 @@ void BusConnection::invalidate()
     if (_state != State::Open) return;
     _state = State::Draining;
     announceEnd();
-    _calls.clear();
-    _parked.clear();
+    dropCalls();
     if (_unwritten.empty()) return close();
     startTimer();
     updateWatch();
@@ -188,8 +223,8 @@ bool BusConnection::paused() const
     // A peer that has gone can add nothing: what it left in the socket is bounded by the kernel.
     if (_peerGone) return false;
     const Limits& limits = _context->limits;
-    return _calls.size() >= limits.callsInFlight || _bytesInFlight >= limits.bytesInFlight ||
-           _unwrittenBytes >= limits.queuedBytes / 4;
+    return _heldBack || _calls.size() >= limits.callsInFlight || _bytesInFlight >= limits.bytesInFlight ||
+           _unwrittenBytes >= limits.queuedBytes / 4 || (!_calls.empty() && _context->full(_peer.pid));
 }
 
 void BusConnection::ready(std::uint32_t events)
@@ -204,37 +239,91 @@ void BusConnection::ready(std::uint32_t events)
 
 void BusConnection::drive(bool writable)
 {
-    for (unsigned turn = 0; turn < kMessagesPerTurn; ++turn) {
-        dispatchParked();
+    _heldBack = false;
+    for (unsigned step = 0; step < kStepsPerTurn; ++step) {
         if (_state == State::Closed) return;
         if (sd_bus_is_open(_bus.get()) <= 0) return end({}); // before sd-bus closes the descriptor that is watched
-        // sd-bus writes and reads in one step. While reading is paused it is called only to write; when that didn't end
-        // a message it reads one, which is what `_parked` is for.
-        if (paused() && !writable) return updateWatch();
-        writable = false;
+        if (!std::exchange(writable, false) && !_fed) {
+            if (!feed()) return;
+            continue;
+        }
 
         const int result = sd_bus_process(_bus.get(), nullptr);
         if (_state == State::Closed) return;
         if (result < 0) return end(describe(result));
         settleWriteQueue(kMessageOverhead);
         if (_state == State::Draining && _unwritten.empty()) return close();
-        if (result == 0) {
-            if (_state == State::Open && sd_bus_is_ready(_bus.get()) > 0) {
-                cancelTimer();
-                _readsExactly = true;
-            }
-            return updateWatch();
+        if (result > 0) {
+            if (_authenticated && !_messageDue) _fed = false; // spares sd-bus a read that finds nothing
+            continue;
         }
-        if (_readsExactly && _parked.empty() && !hasQueuedRead()) return updateWatch();
+        _fed = false;
+        if (_messageDue && _input->betweenMessages()) return end("it sent what is no message");
+        if (!_authenticated && sd_bus_is_ready(_bus.get()) > 0) {
+            _authenticated = true;
+            cancelTimer();
+        }
     }
-    // What is left may be in sd-bus's buffer, where no event tells of it.
     driveAgainLater();
 }
 
-bool BusConnection::hasQueuedRead() const
+/// Gives sd-bus more of what the peer sent; false if there is nothing to give now. The connection may have ended then.
+bool BusConnection::feed()
 {
-    std::uint64_t queued = 0;
-    return sd_bus_get_n_queued_read(_bus.get(), &queued) < 0 || queued > 0;
+    const bool mayPass = !_authenticated || !_input->betweenMessages() || announceMessage();
+    if (!mayPass || _state == State::Closed) return false;
+    switch (_authenticated ? _input->pass() : _input->passLine()) {
+    case BusInput::Outcome::Passed:
+        _fed = true;
+        _messageDue = _authenticated;
+        return true;
+    case BusInput::Outcome::Empty: waitForMore(); return false;
+    case BusInput::Outcome::Ended: end({}); return false;
+    case BusInput::Outcome::Malformed: end("it doesn't speak the protocol"); return false;
+    }
+    return false;
+}
+
+/// Looks at the next message and reserves what it may cost; false if it has to wait, or hasn't come.
+bool BusConnection::announceMessage()
+{
+    if (paused()) {
+        if (_state == State::Open) cancelTimer();
+        updateWatch();
+        return false;
+    }
+    switch (_input->look()) {
+    case BusInput::Outcome::Passed: break;
+    case BusInput::Outcome::Empty: waitForMore(); return false;
+    case BusInput::Outcome::Ended: end({}); return false;
+    case BusInput::Outcome::Malformed: end("it sent what is no message"); return false;
+    }
+    const std::size_t size = _input->announced();
+    if (size > _context->limits.messageSize) {
+        end(fmt::format("it announced a message of {} bytes", size));
+        return false;
+    }
+    const std::size_t cost = size * (1 + kDecodedShare);
+    if (size > kSmallMessage && !_context->admits(_peer.pid, cost)) {
+        if (_peerGone) end("there is no room for what it sent last");
+        _heldBack = true;
+        updateWatch();
+        return false;
+    }
+    hold(_receiving, cost);
+    return true;
+}
+
+void BusConnection::waitForMore()
+{
+    if (_authenticated && _state == State::Open && _input->begun() && _timer == 0) startTimer();
+    updateWatch();
+}
+
+void BusConnection::hold(std::size_t& part, std::size_t bytes)
+{
+    _context->hold(_peer.pid, part, bytes);
+    part = bytes;
 }
 
 void BusConnection::driveAgainLater()
@@ -242,26 +331,32 @@ void BusConnection::driveAgainLater()
     if (std::exchange(_driveQueued, true)) return;
     _context->loop.execute(Priority::Default, [self = shared_from_this()] {
         self->_driveQueued = false;
-        if (self->_state != State::Closed) self->drive(false);
+        if (self->_state == State::Open || self->_state == State::Draining) self->drive(false);
     });
 }
 
 int BusConnection::onMessage(sd_bus_message* message)
 {
     constexpr int kTaken = 1;
-    constexpr int kLeftToSdBus = 0;
+    _messageDue = false;
+    if (_state != State::Open) return kTaken;
+    cancelTimer();
+    takeMessage(message);
+    hold(_receiving, 0);
+    return kTaken;
+}
+
+void BusConnection::takeMessage(sd_bus_message* message)
+{
     std::uint8_t type = 0;
     sd_bus_message_get_type(message, &type);
-    if (type != SD_BUS_MESSAGE_METHOD_CALL || _state != State::Open) return kTaken;
+    if (type != SD_BUS_MESSAGE_METHOD_CALL) return;
 
     const char* path = sd_bus_message_get_path(message);
     const char* interface = sd_bus_message_get_interface(message);
     const char* name = sd_bus_message_get_member(message);
-    if (interface && std::strcmp(interface, "org.freedesktop.DBus.Peer") == 0) return kLeftToSdBus;
-    if (BusMessage standard = answerStandardCall(message, *_interface)) {
-        send(standard.get(), _interface->introspection.size());
-        return kTaken;
-    }
+    if (BusMessage standard = answerStandardCall(message, *_interface))
+        return send(standard.get(), _interface->introspection.size());
 
     CallError error;
     if (path != _interface->path || !_handler) {
@@ -273,16 +368,13 @@ int BusConnection::onMessage(sd_bus_message* message)
             const std::string_view home = member.interface.empty() ? _interface->name : member.interface;
             if (interface && home != interface) continue;
             knownInterface = true;
-            if (member.name != name) continue;
-            receive(message, member);
-            return kTaken;
+            if (member.name == name) return receive(message, member);
         }
         error = knownInterface
                     ? CallError{SD_BUS_ERROR_UNKNOWN_METHOD, fmt::format("there is no method {}", name)}
                     : CallError{SD_BUS_ERROR_UNKNOWN_INTERFACE, fmt::format("there is no interface {}", interface)};
     }
     if (BusMessage answer = makeErrorAnswer(message, error)) send(answer.get(), error.message.size());
-    return kTaken;
 }
 
 void BusConnection::receive(sd_bus_message* message, const Member& member)
@@ -290,7 +382,7 @@ void BusConnection::receive(sd_bus_message* message, const Member& member)
     std::expected<DecodedArguments, CallError> decoded;
     const char* signature = sd_bus_message_get_signature(message, true);
     if (signature && member.in == signature)
-        decoded = decodeArguments(message, _context->limits.messageSize);
+        decoded = decodeArguments(message, _context->limits.messageSize * kDecodedShare);
     else
         decoded = std::unexpected(CallError{
             .message = fmt::format("{} takes \"{}\", not \"{}\"", member.name, member.in, signature ? signature : "")});
@@ -300,34 +392,15 @@ void BusConnection::receive(sd_bus_message* message, const Member& member)
             send(answer.get(), decoded.error().message.size());
         return;
     }
-    const std::size_t size = decoded->size + kMessageOverhead;
-    Call call{&member, std::move(decoded->message), size, BusMessage(sd_bus_message_ref(message))};
-    if (_parked.empty() && !paused()) return dispatch(std::move(call));
-    _parkedBytes += size;
-    _parked.push_back(std::move(call));
-    if (_parkedBytes > _context->limits.queuedBytes) end("it sends more than it reads");
-}
-
-void BusConnection::dispatchParked()
-{
-    while (!_parked.empty() && !paused()) {
-        Call call = std::move(_parked.front());
-        _parked.pop_front();
-        _parkedBytes -= call.size;
-        dispatch(std::move(call));
-    }
-}
-
-void BusConnection::dispatch(Call call)
-{
+    // The message is kept for its answer, with its body.
+    const std::size_t size = _receiving / (1 + kDecodedShare) + decoded->size + kMessageOverhead;
     const std::uint64_t id = ++_lastCall;
-    _bytesInFlight += call.size;
-    const std::string_view member = call.member->name;
-    _calls.emplace(id, PendingCall{call.member, call.size, std::move(call.message)});
+    hold(_bytesInFlight, _bytesInFlight + size);
+    _calls.emplace(id, PendingCall{&member, size, BusMessage(sd_bus_message_ref(message))});
 
-    // The responder is made where it is used: a task that never runs owes no answer.
-    _queue->async([self = shared_from_this(), handler = _handler, id, member,
-                   arguments = std::move(call.arguments)]() mutable {
+    // The task makes the responder: a task that never runs owes no answer.
+    _queue->async([self = shared_from_this(), handler = _handler, id, name = member.name,
+                   arguments = std::move(decoded->message)]() mutable {
         RunLoop& loop = self->_context->loop;
         if (self->_silenced) return;
         Responder responder(
@@ -336,7 +409,7 @@ void BusConnection::dispatch(Call call)
                              [self, id, result = std::move(result)]() mutable { self->answer(id, std::move(result)); });
             },
             [self, id, &loop] { loop.execute(Priority::Default, [self, id] { self->forget(id); }); });
-        (*handler)(member, std::move(arguments), std::move(responder));
+        (*handler)(name, std::move(arguments), std::move(responder));
     });
 }
 
@@ -358,12 +431,18 @@ void BusConnection::forget(std::uint64_t id)
     const auto call = _calls.find(id);
     if (call == _calls.end()) return;
     const bool wasPaused = paused();
-    _bytesInFlight -= call->second.size;
+    hold(_bytesInFlight, _bytesInFlight - call->second.size);
     _calls.erase(call);
     if (wasPaused && !paused())
         drive(false);
     else
         updateWatch();
+}
+
+void BusConnection::dropCalls()
+{
+    _calls.clear();
+    hold(_bytesInFlight, 0);
 }
 
 BusMessage BusConnection::encodeAnswer(const PendingCall& call, CallResult result, std::size_t& size) const
@@ -388,28 +467,44 @@ void BusConnection::send(sd_bus_message* message, std::size_t size)
 {
     // Writing to a peer that has gone would make sd-bus forget what that peer sent before it went.
     if (_state != State::Open || peerHasGone()) return;
+    sd_bus_message_set_sender(message, kOwnName);
+    if (!sd_bus_message_get_destination(message)) sd_bus_message_set_destination(message, kPeerName);
     const int result = sd_bus_send(_bus.get(), message, nullptr);
     if (result < 0 && !isDisconnect(result)) {
         kLog.error("a message to process {} can't be sent: {}", _peer.pid, std::strerror(-result));
         return;
     }
     settleWriteQueue(size + kMessageOverhead);
-    if (_unwritten.size() > 1 && _unwrittenBytes > _context->limits.queuedBytes) end("it doesn't read");
+    if (_unwritten.size() > 1 && _unwrittenBytes > _context->limits.queuedBytes) return end("it doesn't read");
+    relieve();
 }
 
-/// Follows sd-bus's write queue: what it has written is forgotten, what it has taken on counts.
+/// While more waits to be read by peers than may, ends the connection that the most waits for.
+void BusConnection::relieve()
+{
+    while (_context->unread > _context->limits.unreadBytes) {
+        const auto worst = *std::ranges::max_element(
+            _context->connections, {}, [](const auto& connection) { return connection->_unwrittenBytes; });
+        worst->end("it doesn't read, and memory is short");
+    }
+}
+
+/// Brings the account up to date with sd-bus's write queue. Messages that are new there count as `sizeOfNewest` each.
 void BusConnection::settleWriteQueue(std::size_t sizeOfNewest)
 {
     std::uint64_t queued = 0;
     if (sd_bus_get_n_queued_write(_bus.get(), &queued) < 0) queued = 0;
-    while (_unwritten.size() > queued) {
-        _unwrittenBytes -= _unwritten.front();
-        _unwritten.pop_front();
-    }
-    while (_unwritten.size() < queued) {
-        _unwritten.push_back(sizeOfNewest);
-        _unwrittenBytes += sizeOfNewest;
-    }
+    std::size_t bytes = _unwrittenBytes;
+    for (; _unwritten.size() > queued; _unwritten.pop_front()) bytes -= _unwritten.front();
+    for (; _unwritten.size() < queued; bytes += sizeOfNewest) _unwritten.push_back(sizeOfNewest);
+    setUnwritten(bytes);
+}
+
+void BusConnection::setUnwritten(std::size_t bytes)
+{
+    if (bytes == _unwrittenBytes) return;
+    _context->unread += bytes - _unwrittenBytes;
+    hold(_unwrittenBytes, bytes);
 }
 
 bool BusConnection::peerHasGone()
@@ -426,7 +521,11 @@ void BusConnection::updateWatch()
     if (wanted < 0) return driveAgainLater();
     // The peer's end is of interest even while nothing is to be read.
     std::uint32_t events = static_cast<std::uint32_t>(wanted) | EPOLLHUP;
-    if (paused()) events &= ~static_cast<std::uint32_t>(EPOLLIN);
+    const bool reads = !_authenticated || !_input->betweenMessages() || !paused();
+    if (reads)
+        events |= EPOLLIN;
+    else
+        events &= ~static_cast<std::uint32_t>(EPOLLIN);
     if (events != std::exchange(_watchedEvents, events)) _watch->setEvents(events);
 }
 
@@ -456,15 +555,11 @@ void BusConnection::announceEnd()
     if (_invalidationHandler) _queue->async(std::exchange(_invalidationHandler, {}));
 }
 
-/// Ends the connection for `reason`; none if the peer just went.
+/// Ends the connection. Logs `reason`, which is empty if the peer just went.
 void BusConnection::end(std::string_view reason)
 {
     if (_state == State::Closed) return;
     if (!reason.empty()) kLog.error("connection of process {} dropped: {}", _peer.pid, reason);
-    if (_state == State::Open) {
-        _peerGone = true;
-        dispatchParked();
-    }
     close();
 }
 
@@ -473,10 +568,11 @@ void BusConnection::close()
     if (std::exchange(_state, State::Closed) == State::Closed) return;
     cancelTimer();
     announceEnd();
-    _calls.clear();
-    _parked.clear();
+    dropCalls();
+    hold(_receiving, 0);
+    setUnwritten(0);
     if (_watch) _watch->setEvents(0);
-    // Nobody destroys sd-bus's objects, or the watch, from inside their own callbacks.
+    // Later, because sd-bus's objects and the watch must not be destroyed inside their own callbacks.
     _context->loop.execute(Priority::Default, [self = shared_from_this()] { self->dispose(); });
 }
 

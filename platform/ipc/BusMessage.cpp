@@ -16,7 +16,14 @@ namespace platform::ipc {
 
 namespace {
 
+/// Bytes of a value in a message, at least.
 constexpr std::size_t kSmallestValue = 8;
+
+// What decoded values take in memory, with what containers and the allocator add: more than in the message.
+constexpr std::size_t kScalarCost = 2 * sizeof(Value);
+constexpr std::size_t kTextCost = 128;
+constexpr std::size_t kContainerCost = 192;
+constexpr std::size_t kKeyCost = 96;
 
 /// Reads one message front to back. The first failure sticks; from then on reads answer null.
 class ArgumentReader {
@@ -45,26 +52,26 @@ private:
 
     bool charge(std::size_t bytes)
     {
-        _size += std::max(bytes, kSmallestValue);
+        _size += bytes;
         if (_size <= _maximumSize) return true;
-        fail(fmt::format("the message is larger than {} bytes", _maximumSize), SD_BUS_ERROR_LIMITS_EXCEEDED);
+        fail(fmt::format("the arguments take more than {} bytes", _maximumSize), SD_BUS_ERROR_LIMITS_EXCEEDED);
         return false;
     }
 
     template <class T> T basic(char type)
     {
         T read{};
-        if (!charge(sizeof(T))) return T{};
+        if (!charge(kScalarCost)) return T{};
         if (sd_bus_message_read_basic(_bus, type, &read) <= 0) fail("malformed value");
         return read;
     }
 
-    std::string text(char type)
+    std::string text(char type, std::size_t cost)
     {
         const char* read = nullptr;
         if (sd_bus_message_read_basic(_bus, type, &read) <= 0 || !read) return fail("malformed text"), std::string();
         const std::size_t length = std::strlen(read);
-        return charge(kSmallestValue + length) ? std::string(read, length) : std::string();
+        return charge(cost + length) ? std::string(read, length) : std::string();
     }
 
     Value value(bool inVariant)
@@ -84,7 +91,7 @@ private:
         case SD_BUS_TYPE_DOUBLE: return basic<double>(type);
         case SD_BUS_TYPE_STRING:
         case SD_BUS_TYPE_OBJECT_PATH:
-        case SD_BUS_TYPE_SIGNATURE: return text(type);
+        case SD_BUS_TYPE_SIGNATURE: return text(type, kTextCost);
         case SD_BUS_TYPE_UNIX_FD: return inVariant ? fail("a variant can't hold a file handle") : handle();
         case SD_BUS_TYPE_VARIANT: return variant(contents);
         case SD_BUS_TYPE_ARRAY:
@@ -101,7 +108,7 @@ private:
         const void* data = nullptr;
         std::size_t size = 0;
         if (sd_bus_message_read_array(_bus, 'y', &data, &size) < 0) return fail("malformed byte string");
-        if (!charge(kSmallestValue + size)) return {};
+        if (!charge(kTextCost + size)) return {};
         return Bytes(std::string(static_cast<const char*>(data), size));
     }
 
@@ -129,7 +136,7 @@ private:
     Value array(const std::string& contents, bool inVariant)
     {
         Value::Array elements;
-        if (!charge(kSmallestValue)) return {};
+        if (!charge(kContainerCost)) return {};
         if (sd_bus_message_enter_container(_bus, SD_BUS_TYPE_ARRAY, contents.c_str()) < 0)
             return fail("malformed array, or nested too deeply");
         while (!_error && sd_bus_message_at_end(_bus, false) == 0) elements.push_back(value(inVariant));
@@ -142,13 +149,13 @@ private:
         if (contents[1] != 's') return fail("a dictionary's keys must be strings");
         const std::string entry = contents.substr(1, contents.size() - 2);
         Dictionary entries;
-        if (!charge(kSmallestValue)) return {};
+        if (!charge(kContainerCost)) return {};
         if (sd_bus_message_enter_container(_bus, SD_BUS_TYPE_ARRAY, contents.c_str()) < 0)
             return fail("malformed dictionary, or nested too deeply");
         while (!_error && sd_bus_message_at_end(_bus, false) == 0) {
             if (sd_bus_message_enter_container(_bus, SD_BUS_TYPE_DICT_ENTRY, entry.c_str()) <= 0)
                 return fail("malformed dictionary entry");
-            std::string key = text(SD_BUS_TYPE_STRING);
+            std::string key = text(SD_BUS_TYPE_STRING, kKeyCost);
             if (_error) break;
             Value element = value(inVariant);
             if (_error) {

@@ -9,7 +9,7 @@
 
 struct sd_bus_message;
 
-/// Arguments between `ipc::Message` and bus messages. On the thread of the message's bus only.
+/// Encodes and decodes the arguments of bus messages. Only on the thread of the message's bus.
 namespace platform::ipc {
 
 struct BusMessageUnref {
@@ -20,7 +20,7 @@ using BusMessage = std::unique_ptr<sd_bus_message, BusMessageUnref>;
 
 struct DecodedArguments {
     Message message;
-    std::size_t size = 0; ///< bytes, as `Limits` counts them
+    std::size_t size = 0; ///< bytes of memory, roughly
 };
 
 /// File handles that one message may carry; more are refused.
@@ -32,10 +32,10 @@ inline constexpr std::size_t kMaximumHandles = 16;
 [[nodiscard]] std::expected<DecodedArguments, CallError> decodeArguments(sd_bus_message* message,
                                                                          std::size_t maximumSize);
 
-/// Appends `message` to a new bus message by `signature` and answers its size, as `Limits` counts it. A null argument
+/// Appends `message` to a new bus message by `signature` and returns its size there, roughly. A null argument
 /// travels as its type's zero; null entries of dictionaries are left out, null elements
 /// of arrays travel as empty dictionaries; texts are repaired by `busText`. Fails,
-/// naming the argument, where a value doesn't fit its type; the bus message is of no use then.
+/// naming the argument, if a value doesn't fit its type; the bus message is useless then.
 [[nodiscard]] std::expected<std::size_t, std::string> encodeArguments(sd_bus_message* bus, std::string_view signature,
                                                                       const Message& message);
 

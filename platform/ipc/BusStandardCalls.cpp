@@ -4,28 +4,29 @@
 
 #include <fmt/format.h>
 #include <systemd/sd-bus.h>
+#include <systemd/sd-id128.h>
 
 namespace platform::ipc {
 
 namespace {
 
-constexpr const char* kOwnName = ":1.0";  // the service's, to a client that asks for names
-constexpr const char* kPeerName = ":1.1"; // every client's: each has a bus of its own
+constexpr unsigned kAlreadyRunning = 2; // what StartServiceByName says of a service that runs
 
 constexpr std::string_view kDoctype =
     "<!DOCTYPE node PUBLIC \"-//freedesktop//DTD D-BUS Object Introspection 1.0//EN\"\n"
     " \"http://www.freedesktop.org/standards/dbus/1.0/introspect.dtd\">\n";
 
-BusMessage makeAnswer(sd_bus_message* call, const char* signature = nullptr, const char* text = nullptr)
+/// An answer with these values; null if there is no memory.
+template <class... Values> BusMessage makeAnswer(sd_bus_message* call, const char* signature = "", Values... values)
 {
     sd_bus_message* answer = nullptr;
     if (sd_bus_message_new_method_return(call, &answer) < 0) return {};
     BusMessage owned(answer);
-    if (signature && sd_bus_message_append(answer, signature, text) < 0) return {};
+    if (*signature && sd_bus_message_append(answer, signature, values...) < 0) return {};
     return owned;
 }
 
-/// The child of `path` on the way to the object at `below`; nothing if that isn't below `path`.
+/// The name of the child of `path` that leads to the object at `below`; empty if that isn't below `path`.
 std::string_view childTowardsObject(std::string_view path, std::string_view below)
 {
     if (path != "/") {
@@ -50,11 +51,7 @@ BusMessage properties(sd_bus_message* call, std::string_view member)
 {
     const char* interface = nullptr;
     const char* property = nullptr;
-    if (member == "GetAll" && sd_bus_message_has_signature(call, "s")) {
-        BusMessage answer = makeAnswer(call);
-        if (answer && sd_bus_message_append(answer.get(), "a{sv}", 0) < 0) answer.reset();
-        return answer;
-    }
+    if (member == "GetAll" && sd_bus_message_has_signature(call, "s")) return makeAnswer(call, "a{sv}", 0);
     if ((member == "Get" || member == "Set") && sd_bus_message_read(call, "ss", &interface, &property) > 0)
         return makeErrorAnswer(
             call, {SD_BUS_ERROR_UNKNOWN_PROPERTY, fmt::format("{} has no property \"{}\"", interface, property)});
@@ -67,11 +64,20 @@ BusMessage messageBus(sd_bus_message* call, std::string_view member)
     if (member == "Hello") return makeAnswer(call, "s", kPeerName);
     if (member == "AddMatch" || member == "RemoveMatch") return makeAnswer(call);
     if (member == "GetNameOwner" && sd_bus_message_has_signature(call, "s")) return makeAnswer(call, "s", kOwnName);
-    if (member == "ListNames") {
-        BusMessage answer = makeAnswer(call);
-        if (answer && sd_bus_message_append(answer.get(), "as", 2, kOwnName, kPeerName) < 0) answer.reset();
-        return answer;
-    }
+    if (member == "NameHasOwner" && sd_bus_message_has_signature(call, "s")) return makeAnswer(call, "b", 1);
+    if (member == "StartServiceByName" && sd_bus_message_has_signature(call, "su"))
+        return makeAnswer(call, "u", kAlreadyRunning);
+    if (member == "ListNames") return makeAnswer(call, "as", 2, kOwnName, kPeerName);
+    return {};
+}
+
+BusMessage peer(sd_bus_message* call, std::string_view member)
+{
+    if (member == "Ping") return makeAnswer(call);
+    sd_id128_t machine;
+    char text[SD_ID128_STRING_MAX];
+    if (member == "GetMachineId" && sd_id128_get_machine(&machine) >= 0)
+        return makeAnswer(call, "s", sd_id128_to_string(machine, text));
     return {};
 }
 
@@ -89,6 +95,7 @@ BusMessage answerStandardCall(sd_bus_message* call, const Interface& interface)
     if (called == "org.freedesktop.DBus.Introspectable" && member == "Introspect")
         return introspect(call, path, interface);
     if (called == "org.freedesktop.DBus.Properties" && path == interface.path) return properties(call, member);
+    if (called == "org.freedesktop.DBus.Peer") return peer(call, member);
     if (called == "org.freedesktop.DBus") return messageBus(call, member);
     return {};
 }

@@ -22,11 +22,11 @@ constexpr std::string_view kEndpointPrefix = "endpoint-";
 /// Connections accepted before the loop's other work has its turn.
 constexpr int kAcceptsPerTurn = 16;
 
-/// How soon to try again where the process or the system has no descriptor left.
+/// How soon to try again if the process or the system has no descriptor left.
 constexpr Duration kAcceptRetry = std::chrono::seconds(1);
 
-/// The loop's side of a listener: accepts until its listener is gone. Loop's thread but for what is before `start`, and
-/// `retire`.
+/// The loop's side of a listener: accepts until its listener is gone. Loop's thread, except for `retire` and what comes
+/// before `start`.
 class Acceptance : public std::enable_shared_from_this<Acceptance> {
 public:
     Acceptance(std::shared_ptr<BusContext> context, const Interface& interface, std::string label, ListenSocket socket)
@@ -48,7 +48,7 @@ public:
         });
     }
 
-    /// Any thread: removes the path and accepts nobody any more. `stop` is to follow.
+    /// Removes the path and stops accepting; `stop` follows. Any thread.
     void retire()
     {
         _retired = true;
@@ -91,11 +91,19 @@ private:
                        credentials ? credentials->uid : 0);
             return;
         }
+        const pid_t pid = credentials->pid;
+        const auto process = _context->processes.try_emplace(pid).first;
+        if (process->second.connections >= _context->limits.connectionsPerProcess) {
+            kLog.error("{}: refused process {}: it has {} connections", _label, pid, process->second.connections);
+            return;
+        }
+        ++process->second.connections;
         ++_open;
         auto queue = Queue::make(_label, Queue::Kind::Serial, _context->executor, _context->clock);
         auto connection =
-            BusConnection::make(_context, _interface, std::move(socket), Peer{credentials->pid, credentials->uid},
-                                std::move(queue), [weak = weak_from_this()] {
+            BusConnection::make(_context, _interface, std::move(socket), Peer{pid, credentials->uid}, std::move(queue),
+                                [weak = weak_from_this(), context = _context.get(), pid] {
+                                    if (--context->processes[pid].connections == 0) context->processes.erase(pid);
                                     auto self = weak.lock();
                                     if (!self) return;
                                     --self->_open;
@@ -154,7 +162,7 @@ private:
     const std::string _endpoint;
 };
 
-/// Stands in for an endpoint that couldn't be made.
+/// In place of an endpoint that couldn't be made.
 class DeafListener final : public Listener {
 public:
     void setAcceptor(Acceptor) override {}

@@ -12,9 +12,9 @@ class RunLoop;
 
 namespace platform::ipc {
 
-/// Listens in `directory`; sweeps endpoints left there by earlier processes when made. `label` of a listener names the
-/// connections' queues. The run loop, executor and clock must outlive it and what it made. Destroying it, on the loop's
-/// thread or once the loop has stopped, ends all connections.
+/// A transport on D-Bus that listens in `directory`, and first removes the endpoints that earlier processes left there.
+/// The `label` of a listener names its connections' queues. The run loop, executor and clock must outlive the transport
+/// and what it makes. Destroying it, on the loop's thread or after the loop has stopped, ends all connections.
 [[nodiscard]] std::unique_ptr<Transport> makeBusTransport(RunLoop& runLoop, Executor& executor, Clock& clock,
                                                           std::filesystem::path directory, Limits limits = {});
 

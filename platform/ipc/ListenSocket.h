@@ -10,18 +10,18 @@
 
 namespace platform::ipc {
 
-/// A listening Unix stream socket. One that was bound here owns its path: both go with it.
+/// A listening Unix stream socket. If it was bound here it owns its path, and removes it when it is destroyed.
 class ListenSocket {
 public:
-    /// Binds `path` with mode 0600, in a directory that `preparePrivateDirectory` accepts. A socket that nobody answers
-    /// is replaced; one that somebody does is EADDRINUSE; anything else at that path is left alone (EEXIST). Two
-    /// processes that try at once are told apart by a lock file beside the socket, held as long as the socket.
+    /// Binds `path` with mode 0600, in a directory that `preparePrivateDirectory` accepts. Replaces a
+    /// socket that no process listens on; fails with EADDRINUSE if one does, and with EEXIST for any other file. A lock
+    /// file beside the socket, held as long as the socket, decides between two processes that try at once.
     [[nodiscard]] static Result<ListenSocket> bindExclusive(const std::filesystem::path& path);
-    /// Binds a name in `directory` that nobody can guess: `prefix` and 128 random bits in hex.
+    /// Binds an unguessable name in `directory`: `prefix` and 128 random bits in hex.
     [[nodiscard]] static Result<ListenSocket> bindUnguessable(const std::filesystem::path& directory,
                                                               std::string_view prefix);
-    /// The first listening Unix stream socket that the service manager passed to this process. Its path stays the
-    /// manager's. Nothing if there is none.
+    /// The first listening Unix stream socket that the service manager passed to this process; nothing if it passed
+    /// none. The manager keeps the path.
     [[nodiscard]] static std::optional<ListenSocket> fromServiceManager();
 
     ListenSocket(ListenSocket&& other) noexcept;
@@ -31,7 +31,7 @@ public:
     /// Non-blocking, closed on exec.
     [[nodiscard]] int fd() const { return _socket.fd(); }
     [[nodiscard]] const std::filesystem::path& path() const { return _path; }
-    /// Removes the path, where it is ours; the socket stays open.
+    /// Removes the path, if this socket owns it; the socket stays open.
     void unlinkPath();
 
 private:
@@ -43,21 +43,21 @@ private:
     bool _owned;
 };
 
-/// Makes a directory of mode 0700, and what is missing above it. One that is there must be a directory of this user; it
-/// is closed to others.
+/// Makes a directory of mode 0700, and its missing parents. If it exists it must be a directory of this user, not a
+/// link; its mode becomes 0700.
 [[nodiscard]] Result<void> preparePrivateDirectory(const std::filesystem::path& directory);
 
-/// Removes the sockets in `directory` whose names begin with `prefix` and that nobody answers any more.
+/// Removes the sockets in `directory` whose names begin with `prefix` and that no process listens on.
 void sweepDeadSockets(const std::filesystem::path& directory, std::string_view prefix);
 
-/// The process at the other end of a connected socket, as the kernel knows it.
+/// The process that connected a socket, from the kernel.
 struct PeerCredentials {
     pid_t pid = 0;
     uid_t uid = 0;
 };
 [[nodiscard]] std::optional<PeerCredentials> peerCredentials(int fd);
 
-/// Whether a peer may talk to a service of user `own`: only that user's own processes.
+/// Whether a peer of user `peer` may connect to a service of user `own`: only if they are the same.
 [[nodiscard]] constexpr bool mayConnect(uid_t peer, uid_t own)
 {
     return peer == own;

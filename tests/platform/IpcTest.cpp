@@ -4,6 +4,7 @@
 #include <cstdlib>
 #include <deque>
 #include <future>
+#include <poll.h>
 #include <sys/mman.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
@@ -18,6 +19,7 @@
 
 #include "platform/base/Log.h"
 #include "platform/ipc/BusClient.h"
+#include "platform/ipc/BusInput.h"
 #include "platform/ipc/BusTransport.h"
 #include "platform/ipc/ListenSocket.h"
 #include "platform/run/RunLoop.h"
@@ -36,7 +38,7 @@ using testing::HasSubstr;
 constexpr Duration kLong = 60s;                        // only a failing test waits this long
 constexpr std::size_t kBeyondSocketBuffers = 20 << 20; // sd-bus asks for 8 MiB
 constexpr const char* kObjectPath = "/com/example/probe";
-constexpr std::string_view kEveryType = "sxtuibdaya{sv}aa{sv}asah";
+constexpr std::string_view kEveryType = "sxtuibdaya{sv}aa{sv}as";
 
 const Interface& probe()
 {
@@ -46,6 +48,7 @@ const Interface& probe()
         .methods = {{"Echo", kEveryType, kEveryType},
                     {"Take", "a{sv}", "a{sv}"},
                     {"Note", "s", "", true},
+                    {"Open", "s", "ah"},
                     {"Hold", "", "s"},
                     {"Batch", "", "ay"},
                     {"Give", "t", "ay"},
@@ -152,6 +155,13 @@ private:
         if (member == "Fail") return reply(std::unexpected(CallError{.message = "scale: not a number \xff"}));
         if (member == "Misfit") return reply(Message{{1.5}, {}});
         if (member == "Count") return reply(Message{{7}, {}});
+        if (member == "Open") {
+            Message opened{{Value::Array{0}}, {}};
+            opened.handles.emplace_back(memfd_create("handle", MFD_CLOEXEC));
+            const std::string& content = *arguments.args[0].asString();
+            EXPECT_EQ(write(opened.handles[0].fd(), content.data(), content.size()), std::ssize(content));
+            return reply(std::move(opened));
+        }
         if (member == "Note") {
             note(*arguments.args[0].asString());
             return reply(Message{});
@@ -192,6 +202,31 @@ FileHandle rawConnection(const Service& service)
     return socket;
 }
 
+/// One that is past the authentication.
+FileHandle authenticatedConnection(const Service& service)
+{
+    FileHandle socket = rawConnection(service);
+    std::string hex;
+    for (const char digit : std::to_string(geteuid())) hex += "3" + std::string(1, digit);
+    const std::string hello = std::string(1, '\0') + "AUTH EXTERNAL " + hex + "\r\nBEGIN\r\n";
+    EXPECT_EQ(write(socket.fd(), hello.data(), hello.size()), std::ssize(hello));
+    char answer[64];
+    EXPECT_GT(read(socket.fd(), answer, sizeof(answer)), 2);
+    return socket;
+}
+
+/// The fixed header of a call.
+std::string headerOf(std::uint32_t body, std::uint32_t fields)
+{
+    const std::uint32_t numbers[] = {body, 1, fields};
+    return std::string("l\1\0\1", 4) + std::string(reinterpret_cast<const char*>(numbers), sizeof(numbers));
+}
+
+void writeTo(const FileHandle& socket, std::string_view bytes)
+{
+    ASSERT_EQ(send(socket.fd(), bytes.data(), bytes.size(), MSG_NOSIGNAL), std::ssize(bytes)) << strerror(errno);
+}
+
 bool readsUntilEnd(int fd)
 {
     char buffer[256];
@@ -222,13 +257,11 @@ TEST(Ipc, EveryTypeSurvivesTheRoundTrip)
                                     {"double", 0.1},
                                     {"text", "gr\u00fc\u00df"},
                                     {"bytes", Bytes(std::string("\0\xff", 2))},
-                                    {"list", Value::Array{1, "two", Dictionary()}},
+                                    {"list", Value::Array{1, "two", Dictionary(), nullptr}},
                                     {"nested", nested},
                                     {"date", dateFromSecondsSince1970(1.5)},
                                     {"nothing", nullptr}};
     Message sent;
-    sent.handles.emplace_back(memfd_create("handle", MFD_CLOEXEC));
-    ASSERT_EQ(write(sent.handles[0].fd(), "through", 7), 7);
     sent.args = {"a\xffz",
                  INT64_MIN,
                  UINT64_MAX,
@@ -239,12 +272,12 @@ TEST(Ipc, EveryTypeSurvivesTheRoundTrip)
                  Bytes(std::string(1 << 20, '\0')),
                  values,
                  Value::Array{values, Dictionary()},
-                 Value::Array{"p", ""},
-                 Value::Array{0}};
+                 Value::Array{"p", ""}};
     Value::Array expected = sent.args;
     Value travelled = values;
     travelled.mutableDictionary().set("date", 1.5);
     travelled.mutableDictionary().remove("nothing");
+    travelled.mutableDictionary().set("list", Value::Array{1, "two", Dictionary(), Dictionary()});
     expected[0] = "a\ufffdz";
     expected[8] = travelled;
     expected[9] = Value::Array{travelled, Dictionary()};
@@ -252,9 +285,11 @@ TEST(Ipc, EveryTypeSurvivesTheRoundTrip)
     auto got = call(*client, method("Echo"), std::move(sent));
     ASSERT_TRUE(got) << got.error().message;
     EXPECT_EQ(Value(got->args), Value(expected)) << toJson(got->args) << "\n" << toJson(expected);
-    ASSERT_EQ(got->handles.size(), 1u);
+
+    auto opened = call(*client, method("Open"), {{"through"}, {}});
+    ASSERT_EQ(opened->handles.size(), 1u);
     char contents[8] = {};
-    EXPECT_EQ(pread(got->handles[0].fd(), contents, 7, 0), 7);
+    EXPECT_EQ(pread(opened->handles[0].fd(), contents, 7, 0), 7);
     EXPECT_STREQ(contents, "through");
 }
 
@@ -276,10 +311,9 @@ TEST(Ipc, BadCallsAreAnsweredWithAnErrorThatNamesTheFaultAndTheConnectionLivesOn
         {{"Hold", "", "s"}, {}, SD_BUS_ERROR_UNKNOWN_INTERFACE, "com.example.Other", "com.example.Other"},
         {{"Count", "", "u"}, {}, SD_BUS_ERROR_UNKNOWN_METHOD, "Count"}, // of another interface
         {method("Take"),
-         {Dictionary{{"b", Bytes(std::string(1 << 20, 'x'))}}},
+         {Dictionary{{"many", Value::Array(100000, true)}}},
          SD_BUS_ERROR_LIMITS_EXCEEDED,
-         "\"b\": the message"},
-        {method("Take"), {Dictionary{{"many", Value::Array(140000, true)}}}, SD_BUS_ERROR_LIMITS_EXCEEDED, "larger"},
+         "\"many\": the arguments take more than 2097152 bytes"},
         {method("Take"), {deep}, SD_BUS_ERROR_INVALID_ARGS, "nested too deeply"},
         {method("Fail"), {}, SD_BUS_ERROR_INVALID_ARGS, "scale: not a number \ufffd"},
         {method("Misfit"), {}, SD_BUS_ERROR_FAILED, "not of type \"s\""},
@@ -314,8 +348,8 @@ TEST(Ipc, VariantsThatNoValueHoldsAreRefusedByField)
     };
     EXPECT_THAT(answer("(ii)", 1, 2), HasSubstr("argument 1: \"field\": values of type 'r'"));
     EXPECT_THAT(answer("a{us}", 1, 2, "x"), HasSubstr("\"field\": a dictionary's keys"));
-    EXPECT_THAT(answer("h", STDERR_FILENO), HasSubstr("\"field\": a variant can't hold a file handle"));
-    EXPECT_EQ(answer("a{ss}", 1, "k", "x"), "a{sv}"); // what other languages send
+    EXPECT_EQ(answer("a{ss}", 1, "k", "x"), "a{sv}");             // what other languages send
+    EXPECT_THAT(answer("h", STDERR_FILENO), HasSubstr("onnect")); // it is gone
     sd_bus_close_unref(bus);
 }
 
@@ -346,6 +380,20 @@ TEST(Ipc, DeafPeerIsDroppedAndOthersGoOn)
     EXPECT_TRUE(call(*other, method("Count")));
     EXPECT_FALSE(deaf->wait([] { return false; }, kLong));
     EXPECT_FALSE(deaf->connected());
+}
+
+TEST(Ipc, WhatWaitsForAllPeersIsBoundedInSum)
+{
+    Service service({.unreadBytes = kBeyondSocketBuffers * 3 / 2});
+    auto deaf = service.connect();
+    auto deafer = service.connect();
+    service.await([&] { return service.connections.size() == 2; });
+    for (const unsigned peer : {0, 1})
+        service.connections[peer]->push("Told", {{std::string(kBeyondSocketBuffers + peer, 'x'), Dictionary()}, {}});
+    service.await([&] { return service.notes == std::vector<std::string>{"<invalidated>"}; });
+    bool heard = false;
+    deaf->onSignal([&](auto, auto, const Message&) { heard = true; });
+    EXPECT_TRUE(deaf->wait([&] { return heard; }, kLong)) << "the one with the most is dropped";
 }
 
 TEST(Ipc, WhatAPeerSaidBeforeItVanishedStillArrivesAheadOfTheEnd)
@@ -406,6 +454,69 @@ TEST(Ipc, PeersThatDoNotSpeakTheProtocolAreDropped)
     EXPECT_EQ(service.clock.pendingTimers(), 0u) << "an idle connection would wake the service";
 }
 
+TEST(Ipc, MessagesTooLargeAreRefusedByTheirHeader)
+{
+    Service service({.messageSize = 1 << 20});
+    for (const auto& [body, fields] : {std::pair(1 << 20, 0), {0, 1 << 20}, {-1, -1}}) {
+        const FileHandle greedy = authenticatedConnection(service);
+        writeTo(greedy, headerOf(body, fields));
+        EXPECT_TRUE(readsUntilEnd(greedy.fd())) << body << " " << fields;
+    }
+    EXPECT_TRUE(call(*service.connect(), method("Count")));
+}
+
+TEST(Ipc, WhatIsNoMessageEndsTheConnection)
+{
+    Service service;
+    const std::string cases[] = {
+        std::string(kFixedHeader, 'x'),
+        std::string("l\1\0\2", 4) + headerOf(0, 0).substr(4),               // another version of the protocol
+        headerOf(0, 8) + std::string(8, '\xff'),                            // header fields of no type
+        headerOf(0, 16) + std::string("\1\1o\0\2\0\0\0/a\0\0\0\0\0\0", 16), // a call without a member
+    };
+    for (const std::string& bytes : cases) {
+        const FileHandle peer = authenticatedConnection(service);
+        writeTo(peer, bytes);
+        EXPECT_TRUE(readsUntilEnd(peer.fd())) << bytes;
+    }
+    // A line without an end, in place of an authentication.
+    const FileHandle peer = rawConnection(service);
+    writeTo(peer, std::string(5000, 'A'));
+    EXPECT_TRUE(readsUntilEnd(peer.fd()));
+}
+
+TEST(Ipc, UnfinishedMessagesAreBoundedInSumAndInTime)
+{
+    constexpr unsigned kBody = 900 << 10; // with what its values may take, of which there is room for one
+    Service service({.messageSize = 1 << 20, .bytes = 4 << 20});
+    const FileHandle first = authenticatedConnection(service);
+    FileHandle second = authenticatedConnection(service);
+    // Whether the service takes all of a body but its last byte.
+    const auto sends = [&](const FileHandle& socket, int milliseconds) {
+        writeTo(socket, headerOf(kBody, 0));
+        for (std::size_t sent = 0; sent < kBody - 1;) {
+            const std::string part(std::min<std::size_t>(kBody - 1 - sent, 64 << 10), '\0');
+            pollfd writable{socket.fd(), POLLOUT, 0};
+            for (int settled = 0; settled < 3 && poll(&writable, 1, milliseconds) == 0; ++settled) service.settle();
+            const ssize_t got = send(socket.fd(), part.data(), part.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
+            if (got < 0) return false;
+            sent += got;
+        }
+        return true;
+    };
+    EXPECT_TRUE(sends(first, 20000));
+    EXPECT_FALSE(sends(second, 0)) << "stays in the socket";
+    auto other = service.connect();
+    EXPECT_TRUE(call(*other, method("Take"), {{Dictionary{{"small", 1}}}, {}})) << "small ones pass";
+
+    service.clock.advance(29s, [&] { service.settle(); });
+    EXPECT_TRUE(call(*other, method("Count")));
+    service.clock.advance(2s, [&] { service.settle(); });
+    EXPECT_TRUE(readsUntilEnd(first.fd())) << "took too long";
+    second = FileHandle(); // whose turn it was
+    EXPECT_TRUE(call(*other, method("Take"), {{Dictionary{{"large", Bytes(std::string(kBody, 'x'))}}}, {}}));
+}
+
 TEST(Ipc, OtherUsersAreRefusedBeforeAnyoneIsAsked)
 {
     EXPECT_FALSE(mayConnect(0, 1000));
@@ -458,6 +569,18 @@ TEST(Ipc, ConnectionsBeyondTheLimitWaitForTheirTurn)
     service.await([&] { return service.connections.size() == 2; });
 }
 
+TEST(Ipc, OneProcessCannotTakeAllConnections)
+{
+    Service service({.connectionsPerProcess = 1});
+    auto first = service.connect();
+    EXPECT_TRUE(readsUntilEnd(rawConnection(service).fd()));
+    EXPECT_TRUE(call(*first, method("Count")));
+    first.reset();
+    service.await([&] { return service.notes == std::vector<std::string>{"<invalidated>"}; });
+    service.settle();
+    EXPECT_TRUE(call(*service.connect(), method("Count"))) << "its place is free again";
+}
+
 #ifndef __SANITIZE_ADDRESS__ // its checks take descriptors of their own
 TEST(Ipc, AProcessShortOfDescriptorsAcceptsLater)
 {
@@ -484,56 +607,45 @@ TEST(Ipc, AProcessShortOfDescriptorsAcceptsLater)
 }
 #endif
 
-TEST(ListenSocket, TakesOverFromTheDeadOnly)
+// Bindings that were made for a message bus take signals of the name's owner only, and start the service first.
+TEST(Ipc, EveryMessageHasASenderAndTheServiceCountsAsRunning)
 {
-    test::TemporaryDirectory temporary;
-    const std::filesystem::path directory = temporary.path.string() + "/a/b";
-    const auto path = directory / "socket";
-    const auto errorOf = [&] { return ListenSocket::bindExclusive(path).error().code; };
-    {
-        auto living = ListenSocket::bindExclusive(path);
-        ASSERT_TRUE(living) << living.error().description();
-        struct stat status{};
-        stat(directory.c_str(), &status);
-        EXPECT_EQ(status.st_mode & 07777, 0700u);
-        stat(path.c_str(), &status);
-        EXPECT_EQ(status.st_mode & 07777, 0600u);
-        EXPECT_EQ(errorOf(), EADDRINUSE);
-        std::filesystem::remove(directory / "socket.lock"); // as with a socket of the service manager
-        EXPECT_EQ(errorOf(), EADDRINUSE);
-        std::filesystem::create_hard_link(path, directory / "endpoint-dead");
-    }
-    EXPECT_FALSE(std::filesystem::exists(path));
-    std::filesystem::create_hard_link(directory / "endpoint-dead", path);
-    {
-        auto living = ListenSocket::bindUnguessable(directory, "endpoint-");
-        sweepDeadSockets(directory, "endpoint-");
-        EXPECT_TRUE(living && std::filesystem::exists(living->path()));
-        EXPECT_FALSE(std::filesystem::exists(directory / "endpoint-dead"));
-        EXPECT_TRUE(ListenSocket::bindExclusive(path)) << "replaces a dead one";
-    }
-    std::fclose(std::fopen(path.c_str(), "w"));
-    EXPECT_EQ(errorOf(), EEXIST);
-    std::filesystem::create_directory_symlink(directory, temporary.path.string() + "/link");
-    EXPECT_FALSE(preparePrivateDirectory(temporary.path.string() + "/link"));
-    EXPECT_EQ(busAddress("/run/a b%"), "unix:path=/run/a%20b%25");
-}
-
-TEST(ListenSocket, ComesFromTheServiceManagerWhereThereIsOne)
-{
-    testing::FLAGS_gtest_death_test_style = "threadsafe";
-    const auto activated = [] {
-        test::TemporaryDirectory temporary;
-        auto passed = std::move(*ListenSocket::bindExclusive(temporary.path.string() + "/managed"));
-        dup2(passed.fd(), 3);
-        setenv("LISTEN_PID", std::to_string(getpid()).c_str(), 1);
-        setenv("LISTEN_FDS", "1", 1);
-        auto taken = ListenSocket::fromServiceManager();
-        const bool right = taken && taken->fd() == 3 && taken->path() == passed.path();
-        taken.reset();
-        std::exit(right && std::filesystem::exists(passed.path()) ? 0 : 1);
+    Service service;
+    sd_bus* bus = nullptr;
+    sd_bus_new(&bus);
+    sd_bus_set_address(bus, service.listener->endpoint().c_str());
+    sd_bus_set_bus_client(bus, true); // greets, as on a message bus
+    ASSERT_GE(sd_bus_start(bus), 0);
+    const auto senderOf = [&](const char* interface, const char* member, const char* types, auto... values) {
+        sd_bus_error error = SD_BUS_ERROR_NULL;
+        sd_bus_message* reply = nullptr;
+        sd_bus_call_method(bus, "com.example.x", kObjectPath, interface, member, &error, &reply, types, values...);
+        std::string sender = !reply ? error.message : sd_bus_message_get_sender(reply) ? "from " : "from nobody";
+        if (reply && sd_bus_message_get_sender(reply)) sender += sd_bus_message_get_sender(reply);
+        sd_bus_error_free(&error);
+        sd_bus_message_unref(reply);
+        return sender;
     };
-    EXPECT_EXIT(activated(), testing::ExitedWithCode(0), "");
+    constexpr const char* kBus = "org.freedesktop.DBus";
+    EXPECT_EQ(senderOf(kBus, "StartServiceByName", "su", "com.example.x", 0), "from :1.0");
+    EXPECT_EQ(senderOf(kBus, "NameHasOwner", "s", "com.example.x"), "from :1.0");
+    EXPECT_EQ(senderOf("org.freedesktop.DBus.Peer", "Ping", ""), "from :1.0");
+    EXPECT_EQ(senderOf("com.example.Extra", "Count", ""), "from :1.0");
+
+    std::string signalled;
+    sd_bus_add_filter(
+        bus, nullptr,
+        [](sd_bus_message* message, void* got, sd_bus_error*) {
+            *static_cast<std::string*>(got) =
+                sd_bus_message_get_sender(message) ? sd_bus_message_get_sender(message) : "";
+            return 1;
+        },
+        &signalled);
+    service.connections.at(0)->push("Told", {{"news", Dictionary()}, {}});
+    while (signalled.empty() && sd_bus_wait(bus, UINT64_MAX) >= 0)
+        while (sd_bus_process(bus, nullptr) > 0) {}
+    EXPECT_EQ(signalled, ":1.0");
+    sd_bus_close_unref(bus);
 }
 
 TEST(Ipc, ToolsOfOthersCanCallAndIntrospect)

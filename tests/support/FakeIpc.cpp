@@ -19,17 +19,9 @@ std::string_view nextType(std::string_view signature)
     return signature.substr(0, length);
 }
 
-bool travels(const Value& value)
-{
-    if (const auto* array = value.asArray()) return std::ranges::all_of(*array, travels);
-    if (const auto* dictionary = value.asDictionary())
-        return std::ranges::all_of(*dictionary, [](const auto& entry) { return travels(entry.second); });
-    return !value.isNull();
-}
-
 bool fits(std::string_view type, const Value& value, std::size_t handleCount)
 {
-    if (type == "a{sv}") return value.asDictionary() && travels(value);
+    if (type == "a{sv}") return value.asDictionary() != nullptr;
     if (type == "ay") return value.asBytes() != nullptr;
     if (type.starts_with('a')) {
         const auto* array = value.asArray();

@@ -1,0 +1,109 @@
+#include "platform/ipc/BusInput.h"
+
+#include <algorithm>
+#include <bit>
+#include <cerrno>
+#include <cstring>
+#include <sys/socket.h>
+#include <utility>
+
+namespace platform::ipc {
+
+namespace {
+
+/// Bytes of a large message that are passed in one step; an empty pair has room for them.
+constexpr std::size_t kStep = 64u << 10;
+
+std::uint32_t numberAt(std::span<const char, kFixedHeader> header, std::size_t offset)
+{
+    std::uint32_t number = 0;
+    std::memcpy(&number, header.data() + offset, sizeof(number));
+    const bool bigEndian = header[0] == 'B';
+    return bigEndian == (std::endian::native == std::endian::big) ? number : std::byteswap(number);
+}
+
+BusInput::Outcome outcomeOf(ssize_t got)
+{
+    if (got > 0) return BusInput::Outcome::Passed;
+    return got < 0 && (errno == EAGAIN || errno == EINTR) ? BusInput::Outcome::Empty : BusInput::Outcome::Ended;
+}
+
+} // namespace
+
+std::optional<std::uint64_t> messageSize(std::span<const char, kFixedHeader> header)
+{
+    constexpr char kVersion = 1;
+    if ((header[0] != 'l' && header[0] != 'B') || header[3] != kVersion) return std::nullopt;
+    const std::uint64_t fields = numberAt(header, 12);
+    return kFixedHeader + (fields + 7) / 8 * 8 + numberAt(header, 4);
+}
+
+BusInput::Outcome BusInput::fill()
+{
+    // The socket's next event tells of what comes later.
+    if (std::exchange(_drained, false)) return Outcome::Empty;
+    std::array<char, kReadAhead> bytes;
+    const std::size_t room = bytes.size() - _buffer.size();
+    const ssize_t got = recv(_socket, bytes.data(), room, 0);
+    if (got > 0) {
+        _buffer.append(bytes.data(), static_cast<std::size_t>(got));
+        _drained = static_cast<std::size_t>(got) < room;
+    }
+    return outcomeOf(got);
+}
+
+bool BusInput::write(std::span<const char> bytes)
+{
+    return send(_pair.fd(), bytes.data(), bytes.size(), MSG_NOSIGNAL) == static_cast<ssize_t>(bytes.size());
+}
+
+void BusInput::consume(std::size_t count)
+{
+    _buffer.erase(0, count);
+}
+
+BusInput::Outcome BusInput::passLine()
+{
+    for (;;) {
+        if (const std::size_t end = _buffer.find('\n'); end != std::string::npos) {
+            if (!write({_buffer.data(), end + 1})) return Outcome::Ended;
+            consume(end + 1);
+            return Outcome::Passed;
+        }
+        if (_buffer.size() == kReadAhead) return Outcome::Malformed;
+        if (const Outcome outcome = fill(); outcome != Outcome::Passed) return outcome;
+    }
+}
+
+BusInput::Outcome BusInput::look()
+{
+    while (_buffer.size() < kFixedHeader)
+        if (const Outcome outcome = fill(); outcome != Outcome::Passed) return outcome;
+    const auto size = messageSize(std::span<const char, kFixedHeader>(_buffer.data(), kFixedHeader));
+    if (!size) return Outcome::Malformed;
+    _announced = *size;
+    return Outcome::Passed;
+}
+
+BusInput::Outcome BusInput::pass()
+{
+    if (_left == 0) _left = _announced;
+    if (_buffer.empty() && _left <= kReadAhead)
+        if (const Outcome outcome = fill(); outcome != Outcome::Passed) return outcome;
+    if (!_buffer.empty()) {
+        const std::size_t count = std::min(_left, _buffer.size());
+        if (!write({_buffer.data(), count})) return Outcome::Ended;
+        consume(count);
+        _left -= count;
+    } else {
+        std::array<char, kStep> bytes;
+        const ssize_t got = recv(_socket, bytes.data(), std::min(_left, bytes.size()), 0);
+        if (got <= 0) return outcomeOf(got);
+        if (!write({bytes.data(), static_cast<std::size_t>(got)})) return Outcome::Ended;
+        _left -= static_cast<std::size_t>(got);
+    }
+    if (_left == 0) _announced = 0;
+    return Outcome::Passed;
+}
+
+} // namespace platform::ipc
