@@ -4,11 +4,11 @@
 #include <optional>
 #include <string_view>
 
-/// The words by which ranking features, kinds of client, engagement functions and result placements are named, and
-/// which client a user agent or an identifier belongs to. Pure functions.
+/// The names of ranking features, kinds of client, engagement functions and result placements, and which client a user
+/// agent or an identifier belongs to. Pure functions, any thread.
 ///
-/// The two directions of a pair are not exact inverses, and some names are misspelled: both are relied on by the
-/// service and stay as they are. A missing string reads as the unknown kind.
+/// The two directions of a pair are not exact inverses, and some names are misspelled: the service relies on both. A
+/// missing or unknown text reads as `Unknown`. Returned views live for ever.
 namespace tavrin {
 
 enum class FeatureType : std::uint64_t { Domain = 0, MediaType = 1, Topic = 2, Unknown = 3 };
@@ -18,12 +18,12 @@ enum class ResultPlacement : std::uint64_t { Unknown = 0, Top = 1, Bottom = 2 };
 
 using OptionalText = std::optional<std::string_view>;
 
-/// "domain" and "tld", "mediatype" in any case and "mt", "topic".
+/// Knows "domain" and "tld", "mediatype" in any case and "mt", and "topic".
 [[nodiscard]] FeatureType featureTypeFromString(OptionalText text);
 [[nodiscard]] std::string_view stringFromFeatureType(FeatureType type);
 [[nodiscard]] ClientType clientTypeFromString(OptionalText text);
 [[nodiscard]] std::string_view stringFromClientType(ClientType type);
-/// "eng"; "engrate" and "eng/render" are one and print as the latter.
+/// Knows "eng", and "engrate" and "eng/render" for one function, which prints as the latter.
 [[nodiscard]] FunctionType funcTypeFromString(OptionalText text);
 [[nodiscard]] std::string_view stringFromFunctionType(FunctionType type);
 [[nodiscard]] ResultPlacement resultPlacementFromString(OptionalText text);
@@ -32,8 +32,8 @@ using OptionalText = std::optional<std::string_view>;
 /// "wendral" or "vistrel" if the agent contains it in any case (the former wins), else "unknown".
 [[nodiscard]] std::string_view getClientFromUserAgent(OptionalText userAgent);
 
-/// The first of "wendral", "vistrel", "kivo", "lookup", "messages", "news", "tavrind" that the text contains in any
-/// case; first in that order, not in the text.
+/// The first of "wendral", "vistrel", "kivo", "lookup", "messages", "news", "tavrind", in this order, that the text
+/// contains in any case; nothing if it contains none of them.
 [[nodiscard]] std::optional<std::string_view> extractClientNameFromString(OptionalText text);
 
 /// True if `text` contains `part`, in any case.

@@ -24,41 +24,42 @@ struct TAVRequest;
 struct TAVSessionConfiguration;
 struct ZRFeedback;
 
-/// Domain of errors of the way to the daemon: no daemon, a lost connection, a call that was refused or not answered.
+/// Domain of errors on the way to the daemon: there is no daemon, the connection was lost, a call was refused or got no
+/// answer. Codes are those of errno.
 inline constexpr std::string_view TAVClientErrorDomain = "TAVClient";
 
-/// How a request was answered.
+/// The answer to a request.
 struct TAVAnswer {
     std::int64_t queryId = 0;
-    std::shared_ptr<TAVReply> reply;      ///< none where the request was skipped, failed or overtaken
+    std::shared_ptr<TAVReply> reply;      ///< null if the request was skipped, overtaken, or failed
     std::optional<platform::Error> error; ///< the daemon's, or the service's
 };
 
-/// The bag as the daemon sees it for this client. Either may be missing.
+/// The bag as this client sees it, or why there is none; an error may come with a bag, too.
 struct TAVBagAnswer {
     std::shared_ptr<const TAVBag> bag;
     std::optional<platform::Error> error;
 };
 
-/// A downloaded resource: its file, open at the start, and what is known of it.
+/// A downloaded resource: a descriptor of its own for its file, at the start, and its "size", "modified" and "created".
 struct TAVResourceAnswer {
     platform::FileHandle file;
     platform::Value attributes;
     std::optional<platform::Error> error;
 };
 
-/// What all kinds of connection share. One thread; callbacks run inside `wait` and the calls that wait.
+/// What all kinds of connection share. Belongs to one thread; callbacks run inside `wait` and inside calls that wait.
 class TAVConnection {
 public:
     using AnswerHandler = std::function<void(platform::Result<TAVAnswer>)>;
 
-    /// How long the calls that wait do so; 30 s. A daemon that has just been started needs some of it.
+    /// How long calls wait for their answer; default 30 s, of which a daemon that is just being started takes some.
     void setTimeout(platform::Duration timeout) { _timeout = timeout; }
-    /// Runs callbacks until `done()`, and answers that; false when `timeout` passed or the connection ended before. A
-    /// program that waits for something else too, such as keys, gives its descriptor: `done` is asked again, and reads
-    /// it, whenever it can be read.
+    /// Runs callbacks until `done()` returns true; returns false if `timeout` passes or the connection ends before. To
+    /// wait for something else too, such as keys, pass its descriptor: `done` is called again whenever that can be
+    /// read, and must read it.
     bool wait(const std::function<bool()>& done, platform::Duration timeout, int descriptor = -1);
-    /// False once the daemon has closed the connection, as it does after an invalid configuration.
+    /// False after the daemon has closed the connection, as it does after an invalid configuration.
     [[nodiscard]] bool connected() const;
 
 protected:
@@ -79,15 +80,15 @@ protected:
     platform::Duration _timeout = std::chrono::seconds(30);
 };
 
-/// A connection to the endpoint that `configure` answered: requests for views that outlive a search, and images.
+/// A connection to the endpoint that `configure` returns: requests for views that outlive a search, and images.
 class TAVEndpointClient : public TAVConnection {
 public:
     [[nodiscard]] static platform::Result<std::unique_ptr<TAVEndpointClient>> connect(const std::string& endpoint);
 
-    /// More results and cards are served here; other kinds are not answered.
+    /// Serves more results and cards; requests of other kinds get no answer.
     platform::Result<TAVAnswer> request(const TAVRequest& request, const TAVSessionConfiguration& configuration);
-    /// The bytes of images, by their "url" or "id": as many of them as the daemon has within `limit`, a minute at most.
-    /// `images` are dictionaries with these keys, as they stand in answers.
+    /// The bytes of images, by their "url" or "id": of those that the daemon has within `limit`, a minute at most.
+    /// `images` are dictionaries with these keys, as in answers of the service.
     platform::Result<std::map<std::string, platform::Bytes>> loadImages(const platform::Value::Array& images,
                                                                         platform::Duration limit);
 
@@ -95,8 +96,7 @@ private:
     using TAVConnection::TAVConnection;
 };
 
-/// A connection to the flusher bridge, whose address `TAVClient::listenToFlusher` answers. A tool that watches then
-/// waits:
+/// A connection to the flusher bridge, at the address that `TAVClient::listenToFlusher` returns. A tool that watches:
 ///
 ///     auto bridge = tavrin::TAVFlusherClient::connect(endpoint, listener);
 ///     (*bridge)->initiateConnection(FlusherIntent::WatchEvents);
@@ -107,7 +107,7 @@ public:
     [[nodiscard]] static platform::Result<std::unique_ptr<TAVFlusherClient>> connect(const std::string& endpoint,
                                                                                      TAVFlusherListener& listener);
 
-    /// Answered once the bridge knows it; its work may be done later, see `TAVFlusherListener::workDone`.
+    /// Returns when the bridge has the intent; its work may end later, see `TAVFlusherListener::workDone`.
     platform::Result<void> initiateConnection(FlusherIntent intent);
 
 private:
@@ -120,30 +120,30 @@ private:
 ///     auto endpoint = (*client)->configure({"com.example.app", "Example/1"});
 ///     auto answer = (*client)->request(*TAVSearchRequest::searchRequestWithString("weather", trigger));
 ///
-/// While the user types, `send` a request for each key and take the answers inside `wait`: those that a later request
-/// has overtaken come without a reply.
+/// While the user types, `send` a request for each key and take the answers inside `wait`: an answer that a later
+/// request has overtaken has no reply.
 class TAVClient : public TAVConnection {
 public:
     /// "unix:path=$XDG_RUNTIME_DIR/com.quorvane.tavrind/socket".
     [[nodiscard]] static std::string defaultAddress();
-    /// Connects; where systemd holds the socket, that starts the daemon.
+    /// Connects. If systemd holds the socket, that starts the daemon.
     [[nodiscard]] static platform::Result<std::unique_ptr<TAVClient>>
     connect(const std::string& address = defaultAddress());
 
-    /// Introduces the client, which other calls need; answers the address for `TAVEndpointClient`.
+    /// Introduces the client, as other calls require; returns the address for `TAVEndpointClient`.
     platform::Result<std::string> configure(const TAVSessionConfiguration& configuration);
     platform::Result<TAVBagAnswer> bag();
     platform::Result<TAVAnswer> request(const TAVRequest& request);
     void send(const TAVRequest& request, AnswerHandler handler);
-    /// Reports what the user saw or did. It is out once `wait` or another call has run; inside of which `taken` is
-    /// called when the daemon has it, or with the reason why it didn't take it.
+    /// Reports what the user saw or did. The event is sent inside `wait` or the next call. `taken` is called there,
+    /// too, when the daemon has the event, or with the reason why it refused it.
     void reportEvent(const std::string& event, std::int64_t queryId, const ZRFeedback& feedback,
                      std::function<void(platform::Result<void>)> taken = {});
     /// The feedback of the current session, as it would be uploaded.
     platform::Result<platform::Value::Array> feedback();
     /// The address of the flusher bridge.
     platform::Result<std::string> listenToFlusher();
-    /// One {"identifier", "agent"} for each client that the daemon knows.
+    /// {"identifier", "agent"} of each client that the daemon knows.
     platform::Result<platform::Value::Array> sessions();
     platform::Result<TAVResourceAnswer> resource(const std::string& identifier);
     /// What the daemon is doing; needs no configuration.

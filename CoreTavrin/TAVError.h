@@ -12,13 +12,13 @@ inline constexpr std::string_view TAVErrorDomain = "TAVErrorDomain";
 
 /// Codes in `TAVErrorDomain`.
 enum TAVErrorCode : std::int64_t {
-    TAVErrorTimeout = 1,           ///< no bag in time ("timeout"), or no user agent yet ("no UserAgent")
+    TAVErrorTimeout = 1,           ///< no bag within a second ("timeout"), or no user agent yet ("no UserAgent")
     TAVErrorBagFetch = 2,          ///< the bag could not be fetched
     TAVErrorNotFound = 404,        ///< no such resource
-    TAVErrorInvalidResponse = 500, ///< an answer or a configuration that makes no sense
+    TAVErrorInvalidResponse = 500, ///< an invalid answer or configuration, or a request that can't be made
 };
 
-/// An error of the daemon's with its "reason".
+/// An error in `TAVErrorDomain` with this "reason".
 [[nodiscard]] inline platform::Error makeTAVError(std::int64_t code, std::string reason)
 {
     return platform::Error::withReason(std::string(TAVErrorDomain), code, std::move(reason));

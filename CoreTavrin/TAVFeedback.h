@@ -9,7 +9,7 @@
 #include "searchrecords/ZRResultFeedback.h"
 #include "searchrecords/ZRSearchResult.h"
 
-/// What the service's own answers and the daemon add to the search records.
+/// The records that this daemon and its service add to the search records.
 namespace tavrin {
 
 /// A request that was answered without the service, or not at all.

@@ -22,34 +22,38 @@ struct ZRFeedback;
 
 using OptionalError = std::optional<platform::Error>;
 using BagReply = platform::Reply<std::shared_ptr<const TAVBag>, OptionalError>;
-/// (query id, reply or none, error or none): every request is answered once, or not at all where its kind isn't served.
+/// (query id, reply or null, error or nothing). Every request of a kind that is served is answered once; others are
+/// abandoned.
 using RequestReply = platform::Reply<std::int64_t, std::shared_ptr<TAVReply>, OptionalError>;
 using ResourceReply = platform::Reply<platform::FileHandle, platform::Value, OptionalError>;
 
-/// What the daemon offers a client. Calls arrive on the connection's queue.
+/// What the daemon offers a client. Calls arrive on the connection's queue. Records may be null: the caller sent none,
+/// or one of an unknown class.
 class TAVDaemonXPC {
 public:
     virtual ~TAVDaemonXPC() = default;
-    /// Introduces the client; answers the address of the endpoint for `TAVEndpointXPC`. An invalid configuration is not
-    /// answered: the connection is closed.
+    /// Introduces the client; the reply is the address of the endpoint for `TAVEndpointXPC`. An invalid configuration
+    /// gets no reply: the connection is closed.
     virtual void configure(std::shared_ptr<TAVSessionConfiguration> configuration,
                            platform::Reply<std::string> reply) = 0;
     virtual void bag(BagReply reply) = 0;
+    /// `request` is never null.
     virtual void request(std::shared_ptr<TAVRequest> request, RequestReply reply) = 0;
-    /// `call` is answered when the last copy of it goes: hold it until the event has been dealt with.
+    /// `feedback` is never null. The call is answered when the last copy of `call` is destroyed: hold one until the
+    /// event has been dealt with.
     virtual void reportEvent(const std::string& event, std::int64_t queryId, std::shared_ptr<ZRFeedback> feedback,
                              std::shared_ptr<void> call) = 0;
-    /// The current session's feedback, as the dictionaries that are uploaded, with relative times.
+    /// The current session's feedback: the dictionaries that are uploaded, with relative times.
     virtual void feedback(const std::string& argument,
                           platform::Reply<platform::Value::Array, OptionalError> reply) = 0;
     /// The address of the flusher bridge, for `TAVFlusherXPC`.
     virtual void listenToFlusher(platform::Reply<std::string> reply) = 0;
-    /// One {"identifier", "agent"} for each client known.
+    /// {"identifier", "agent"} of each client known.
     virtual void listSessions(platform::Reply<platform::Value::Array> reply) = 0;
     virtual void fileHandleAndAttributesForResource(const std::string& resource, ResourceReply reply) = 0;
 };
 
-/// What the daemon reports about itself, to whoever diagnoses it; needs no configuration.
+/// What the daemon reports about itself for diagnosis; needs no configuration. Calls arrive on a connection's queue.
 class TAVDiagnosticsXPC {
 public:
     virtual ~TAVDiagnosticsXPC() = default;
@@ -66,27 +70,27 @@ public:
     virtual void bagDidLoad(const std::shared_ptr<const TAVBag>& bag, const OptionalError& error) = 0;
 };
 
-/// What is served on the endpoint that `configure` answers. Calls arrive on that connection's queue.
+/// What the daemon serves on the endpoint that `configure` returns. Calls arrive on that connection's queue.
 class TAVEndpointXPC {
 public:
     virtual ~TAVEndpointXPC() = default;
-    /// More results and cards; other kinds are not answered.
+    /// Serves more results and cards; other kinds are abandoned. `request` is never null, `configuration` may be.
     virtual void request(std::shared_ptr<TAVRequest> request, std::shared_ptr<TAVSessionConfiguration> configuration,
                          RequestReply reply) = 0;
-    /// The bytes of images by "url" or "id", as many as are there within `timeout` nanoseconds.
+    /// The bytes of images by "url" or "id": of those that are there within `timeout` nanoseconds.
     virtual void loadImages(platform::Value::Array images, std::uint64_t timeout,
                             platform::Reply<platform::Value> reply) = 0;
 };
 
-/// What a tool tells the flusher bridge that it is there for. Numbers are the wire's; the bridge may get others.
+/// What a tool asks the flusher bridge for. The numbers are those on the wire; a tool may send others.
 enum class FlusherIntent : std::uint64_t {
-    WatchFlushes, ///< `flushedData` goes to this tool
-    WatchEvents,  ///< `receivedFeedbackDescription` goes to this tool
-    StopFlushing, ///< no flush in the background until the next dump; then `workDone`
-    Dump,         ///< all sessions end and are flushed now; then `workDone`
+    WatchFlushes, ///< send this tool `flushedData`
+    WatchEvents,  ///< send this tool `receivedFeedbackDescription`
+    StopFlushing, ///< flush nothing in the background until the next dump; `workDone` follows
+    Dump,         ///< end and flush all sessions now; `workDone` follows
 };
 
-/// What the flusher bridge takes from a diagnostic tool. Calls arrive on that connection's queue.
+/// What the flusher bridge offers a diagnostic tool. Calls arrive on that connection's queue.
 class TAVFlusherXPC {
 public:
     virtual ~TAVFlusherXPC() = default;

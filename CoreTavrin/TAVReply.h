@@ -26,7 +26,7 @@ struct TAVHTTPRequest : platform::RecordOf<TAVHTTPRequest> {
 /// The HTTP response behind a verbose reply.
 struct TAVHTTPResponse : platform::RecordOf<TAVHTTPResponse> {
     static constexpr std::string_view kClass = "TAVHTTPResponse";
-    std::string url; ///< where the answer came from, after redirects
+    std::string url; ///< that answered, after redirects
     std::int64_t statusCode = 0;
     platform::Value headers; ///< dictionary of strings
     static constexpr auto fields()
@@ -44,7 +44,7 @@ struct TAVReply : platform::RecordOf<TAVReply> {
     double scale = 0;                            ///< the request's
     std::shared_ptr<TAVHTTPRequest> httpRequest; ///< verbose replies only, like the response
     std::shared_ptr<TAVHTTPResponse> httpResponse;
-    /// The service's answer as JSON text (an array of result sets), as it came; none where it was no JSON.
+    /// The service's answer as JSON text (an array of result sets), as it came; nothing if it was no JSON.
     std::optional<platform::Bytes> rawResponse;
     std::optional<std::string> geoSessionEntityString;
 

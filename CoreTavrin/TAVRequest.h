@@ -11,7 +11,7 @@
 #include "platform/values/Record.h"
 #include "searchrecords/ZREnums.h"
 
-/// What a client asks: one record for each kind of request, all with the fields of `TAVRequest`.
+/// Requests of clients: one record for each kind, all with the fields of `TAVRequest`.
 namespace tavrin {
 
 /// One more item for the query of the HTTP request. Without a value it is a bare name.
@@ -30,19 +30,19 @@ struct TAVQueryItem : platform::RecordOf<TAVQueryItem> {
     }
 };
 
-/// What all requests have. Only its subclasses are served.
+/// The fields of all requests. Only subclasses are served.
 struct TAVRequest : platform::RecordOf<TAVRequest> {
     static constexpr std::string_view kClass = "TAVRequest";
 
     std::string queryString;         ///< what the user typed
     std::int64_t queryId = 0;        ///< rises with every request of a connection
-    std::uint64_t clientQueryId = 0; ///< the client's own number for the query; 0 is none
+    std::uint64_t clientQueryId = 0; ///< the client's own number for the query; 0 for none
     std::vector<std::shared_ptr<TAVQueryItem>> queryItems;
     double scale = 0;          ///< of the client's screen, for images; 0 is the main screen's
     bool verboseReply = false; ///< the reply carries the HTTP request and response
     StartSearchTrigger triggerEvent = StartSearchTrigger::Unknown;
     std::optional<std::string> uuid;
-    std::optional<std::string> keyboardInputMode; ///< missing: the current keyboard's
+    std::optional<std::string> keyboardInputMode; ///< default: the current keyboard's
     platform::Value topics;                       ///< the user's top topics: an array or dictionary, or null
     /// From a caller that can make one call only, such as busctl, which introduces itself inside its request.
     std::shared_ptr<TAVSessionConfiguration> configuration;
@@ -109,7 +109,7 @@ struct TAVCardRequest : platform::RecordOf<TAVCardRequest, TAVRequest> {
 /// Words that the user looks up in a text; `queryString` has the words.
 struct TAVLookupRequest : platform::RecordOf<TAVLookupRequest, TAVRequest> {
     static constexpr std::string_view kClass = "TAVLookupRequest";
-    std::optional<std::string> clientContext; ///< where the text stands: "mail", "article"
+    std::optional<std::string> clientContext; ///< what the text is part of: "mail", "article"
     std::optional<std::string> hintDomain;    ///< domain of the hint that was tapped
     LookupSelectionType selectionType = LookupSelectionType::Default;
     std::optional<std::string> queryContext; ///< the text around the words

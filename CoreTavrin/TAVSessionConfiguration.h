@@ -7,15 +7,15 @@
 
 namespace tavrin {
 
-/// Who a client is and how it wants to be served; the first thing that it sends.
+/// Who a client is and how to serve it; a client sends it first.
 struct TAVSessionConfiguration : platform::RecordOf<TAVSessionConfiguration> {
     static constexpr std::string_view kClass = "TAVSessionConfiguration";
 
     /// The client's session identifier, "com.quorvane.vistrel". Connections with the same one share cache and session.
     std::optional<std::string> identifier;
-    /// A name/version token, "Vistrel/4.2". It is sent to the service and selects the client's view of the bag.
+    /// A name/version token, "Vistrel/4.2". It goes to the service and selects the client's view of the bag.
     std::optional<std::string> userAgent;
-    /// Images of search answers are not fetched ahead.
+    /// Don't fetch the images of answers ahead.
     bool dontPreloadImages = false;
     /// Seconds that a request may go without an answer; 0 leaves it to the bag.
     double timeoutIntervalForRequest = 0;

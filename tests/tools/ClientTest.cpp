@@ -1,3 +1,5 @@
+#include <fstream>
+#include <map>
 #include <regex>
 #include <sys/mman.h>
 #include <thread>
@@ -20,6 +22,7 @@
 #include "searchrecords/ZRViewFeedback.h"
 #include "tests/support/ManualClock.h"
 #include "tests/support/TemporaryDirectory.h"
+#include "tools/tavrinctl/FeedbackRecords.h"
 
 namespace tavrin::test {
 namespace {
@@ -339,6 +342,24 @@ TEST(Introspection, DescribesEveryMemberAsItIsServed)
 {
     for (const platform::ipc::Interface* interface : {&daemonInterface(), &endpointInterface(), &flusherInterface()})
         EXPECT_THAT(membersIn(interface->introspection), testing::UnorderedElementsAreArray(membersOf(*interface)));
+}
+
+TEST(Records, EveryEventAndItsFieldsAreDocumented)
+{
+    std::ifstream file(SOURCE_DIR "/docs/ipc/records.md");
+    std::map<std::string, std::string> rows;
+    const std::regex row("\\| `(\\w+)` \\|.*");
+    for (std::string line; std::getline(file, line);)
+        if (std::smatch found; std::regex_match(line, found, row)) rows[found[1]] = line;
+    for (const auto& [name, fields] : ctl::reportableRecords()) {
+        std::string documented = rows[name];
+        for (std::smatch base; std::regex_search(documented, base, std::regex("those of `(\\w+)`"));)
+            documented = base.prefix().str() + base.suffix().str() + rows[base[1]];
+        for (const Value& field : *fields.asArray())
+            EXPECT_TRUE(*field.asString() == "timestamp" || documented.contains("`" + *field.asString() + "`"))
+                << name << "." << *field.asString();
+        EXPECT_FALSE(documented.empty()) << name;
+    }
 }
 
 TEST(Client, WithoutADaemonSaysWhereItLooked)
