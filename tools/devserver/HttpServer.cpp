@@ -67,7 +67,8 @@ struct Stream {
     std::size_t length = 0; // as announced; endless bodies have none
     std::size_t end = 0;
 
-    /// Writes the bytes at `offset`, `size` at most; -2 ends the connection.
+    /// Writes the bytes at `offset`, `size` at most, and returns their number; MHD_CONTENT_READER_END_WITH_ERROR ends
+    /// the connection.
     ssize_t read(std::size_t offset, char* buffer, std::size_t size)
     {
         const std::string& body = answer.body;
@@ -193,8 +194,9 @@ struct HttpServer::Implementation {
             return MHD_YES;
         }
         if (exchange.tooLarge) return refuse(connection);
-        const Answer answer = handler(request);
-        return MHD_queue_response(connection, static_cast<unsigned>(answer.status), responseOf(answer, request).get());
+        Answer answer = handler(request);
+        const auto status = static_cast<unsigned>(answer.status);
+        return MHD_queue_response(connection, status, responseOf(std::move(answer), request).get());
     }
 
     static MHD_Result refuse(MHD_Connection* connection)
