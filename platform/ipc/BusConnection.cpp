@@ -580,6 +580,7 @@ void BusConnection::dispose()
 {
     _watch.reset();
     _bus.reset();
+    _input.reset();
     _socket = FileHandle();
     _context->connections.erase(shared_from_this());
     if (_closed) std::exchange(_closed, {})();
