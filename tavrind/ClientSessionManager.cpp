@@ -97,10 +97,7 @@ void ClientSessionManager::addTavrinFeedback(std::shared_ptr<TavrinFeedback> fee
 
 bool ClientSessionManager::_wantsFeedback(const TavrinFeedback& feedback) const
 {
-    if (!_assembly.bagController) return true;
-    TavrinBagController& bags = *_assembly.bagController;
-    // To see whether the bag is stale its URL is made, which costs more than an event: once for each session will do.
-    const auto bag = _session ? bags.inMemoryBag() : bags.currentBag();
+    const auto bag = _assembly.bagController ? _assembly.bagController->currentBag() : nullptr;
     return !bag || TAVBag(bag->rawBag(), feedback.userAgent).feedbackEnabled();
 }
 

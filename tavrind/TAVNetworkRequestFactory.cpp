@@ -444,6 +444,7 @@ void TAVNetworkRequestFactory::_setUpDebuggingQueryItems()
 {
     const auto parameters = _assembly.userDefaults.string("TAVDebugParameters");
     if (!parameters) return;
+    ++_bagContextGeneration;
     log().log("processing debug parameters: ({})", *parameters);
     std::string_view rest = *parameters;
     for (std::size_t end = 0; end != std::string_view::npos;) {
@@ -477,6 +478,7 @@ void TAVNetworkRequestFactory::_updateLocale()
     }
     _context.preferredLanguages = encodable && !languages.empty() ? platform::toJson(languages) : "";
     if (!encodable) log().error("Error encoding preferred languages {}.", platform::toJson(languages));
+    ++_bagContextGeneration;
 }
 
 void TAVNetworkRequestFactory::_updateTimeZone()
@@ -497,7 +499,9 @@ bool TAVNetworkRequestFactory::_updateProfile(const platform::DeviceProfile& pro
     if (_context.geoSessionId.empty() && !_context.geoSessionEntity.empty())
         log().error("GEOUserSessionEntity does not respond to selector sessionIDString, actual class is {}",
                     "geoSession");
-    return _context.geoDeviceCountryCode != before;
+    const bool changed = _context.geoDeviceCountryCode != before;
+    if (changed) ++_bagContextGeneration;
+    return changed;
 }
 
 void TAVNetworkRequestFactory::_post(const char* notification) const

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <atomic>
 #include <cstdint>
 #include <memory>
 #include <optional>
@@ -88,6 +89,9 @@ public:
     [[nodiscard]] platform::UrlRequest bagCacheRequest(const TavrinBagController& controller,
                                                        const std::string& userAgent, const std::string& version);
 
+    /// Changes with everything of the context that the URL of a bag request is made of.
+    [[nodiscard]] std::uint64_t bagContextGeneration() const { return _bagContextGeneration; }
+
     // A client's requests. The bag carries the client's user agent; `timeout` is the client's, if it has one.
     [[nodiscard]] Request searchRequest(const TAVRequest& request, const TAVBag& bag, const platform::Uuid& userGuid,
                                         std::uint64_t fieldMask = 0, std::optional<platform::Duration> timeout = {});
@@ -143,6 +147,7 @@ private:
     void guuidChangeNotification();
 
     Assembly& _assembly;
+    std::atomic<std::uint64_t> _bagContextGeneration = 0;
     std::shared_ptr<platform::Queue> _contextAccessQueue;
     RequestContext _context; // on _contextAccessQueue, like all below
     std::optional<platform::Location> _currentLocation;

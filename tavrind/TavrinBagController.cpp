@@ -46,6 +46,7 @@ constexpr platform::Duration kFirstAnnouncementInterval = std::chrono::minutes(1
 constexpr platform::Duration kLongestAnnouncementInterval = std::chrono::hours(4);
 constexpr const char* kExpirationKey = "__expiration";
 constexpr const char* kBagUrlKey = "__bagurl";
+constexpr const char* kBagUrlDefault = "TAVBagURL";
 constexpr const char* kNewsUserAgent = "news/1.0";
 constexpr unsigned kFetchRetries = 5;
 
@@ -121,6 +122,8 @@ std::shared_ptr<TavrinBagController> TavrinBagController::make(Assembly& assembl
 {
     auto controller = std::make_shared<TavrinBagController>(assembly);
     Value cached = controller->diskCachedBagDictionary();
+    if (!cached.isNull() && controller->_isRefreshRequiredForCachedBag(cached))
+        controller->_fetchBagStateWithVersion({});
     if (!cached.isNull())
         controller->cacheBagState(std::make_shared<const TAVBag>(std::move(cached), controller->_userAgent), true);
     controller->_refreshObserver = assembly.notificationCenter.observe(
@@ -145,9 +148,9 @@ TavrinBagController::~TavrinBagController() = default;
 
 Url TavrinBagController::bagFetchURLWithCountry(const std::string& country) const
 {
-    if (const auto configured = _assembly.userDefaults.string("TAVBagURL")) {
+    if (const auto configured = _assembly.userDefaults.string(kBagUrlDefault)) {
         if (auto url = Url::parse(*configured); url && !url->host().empty()) return *url;
-        log().error("Malformed tavrin bag URL in user defaults key {}", "TAVBagURL");
+        log().error("Malformed tavrin bag URL in user defaults key {}", kBagUrlDefault);
     }
     const bool china = country.size() == 2 && std::toupper(static_cast<unsigned char>(country[0])) == 'C' &&
                        std::toupper(static_cast<unsigned char>(country[1])) == 'N';
@@ -197,7 +200,17 @@ void TavrinBagController::forceFetchBag(const Value& announcement)
 
 std::string TavrinBagController::_bagCacheURL()
 {
-    return _assembly.requestFactory->bagCacheRequest(*this, _userAgent, {}).url.string();
+    // The generation is read first: if the context changes meanwhile, the next call makes the URL once more.
+    const std::uint64_t context = _assembly.requestFactory->bagContextGeneration();
+    auto configured = _assembly.userDefaults.string(kBagUrlDefault);
+    auto known = _cacheUrl.load();
+    if (!known || known->context != context || known->configured != configured) {
+        known = std::make_shared<const CacheUrl>(
+            context, std::move(configured),
+            _assembly.requestFactory->bagCacheRequest(*this, _userAgent, {}).url.string());
+        _cacheUrl = known;
+    }
+    return known->url;
 }
 
 bool TavrinBagController::_isRefreshRequiredForCachedBag(const Value& rawBag)
@@ -252,7 +265,7 @@ Value TavrinBagController::diskCachedBagDictionary()
         log().log("Unexpected class deserialized from bag cache: {}.", platform::typeName(bag->type()));
         return {};
     }
-    return std::move(*bag); // stale or not: the reading that ends the start-up fetches a stale one
+    return std::move(*bag); // stale or not
 }
 
 Value TavrinBagController::_dictionaryToCacheBag(const Value& fetched)

@@ -94,6 +94,12 @@ public:
 private:
     using Completion = std::move_only_function<void(std::shared_ptr<const TAVBag>, std::optional<platform::Error>)>;
     struct Fetch;
+    /// The URL of the bag cache request, and what it was made of: each read of the bag compares it.
+    struct CacheUrl {
+        std::uint64_t context;
+        std::optional<std::string> configured;
+        std::string url;
+    };
 
     [[nodiscard]] platform::Value diskCachedBagDictionary();
     [[nodiscard]] platform::Value cacheBagDictionary(const platform::Value& fetched);
@@ -113,6 +119,7 @@ private:
     AnnouncedVersion _announced;                // on _inMemoryBagCacheAccessQueue
     std::shared_ptr<platform::Queue> _inMemoryBagCacheAccessQueue;
     std::string _userAgent;
+    std::atomic<std::shared_ptr<const CacheUrl>> _cacheUrl;
     std::atomic<bool> _fetchInProgress = false;
     platform::NotificationCenter::Token _refreshObserver;
 };

@@ -103,6 +103,10 @@ TEST_F(BagControllerTest, FetchesOnceKeepsItOnDiskAndRestartsFromThere)
     device.drain();
     EXPECT_EQ(tasks().size(), 1u) << "and fetched anew";
     EXPECT_EQ(counter("bag.expired"), 1);
+
+    start();
+    const auto another = TavrinBagController::make(assembly());
+    EXPECT_TRUE(another->fetchInProgress() && another->inMemoryBag()) << "a stale bag is fetched anew as it is read";
 }
 
 // The service's faults: each leaves the bag at hand, is announced, and doesn't stop the next fetch.

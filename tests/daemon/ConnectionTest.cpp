@@ -1,14 +1,18 @@
+#include <algorithm>
 #include <set>
 
+#include "platform/values/Archive.h"
 #include "platform/values/Dictionary.h"
 #include "searchrecords/ZRRecords.h"
 #include "searchrecords/ZRResultFeedback.h"
+#include "tavrind/ArchivedDataIterator.h"
 #include "tavrind/ClientConnection.h"
 #include "tavrind/ClientState.h"
 #include "tavrind/ClientStateManager.h"
 #include "tavrind/TavrinLogging.h"
 #include "tavrind/TavrinService.h"
-#include "tests/support/DaemonFixture.h"
+#include "tavrind/TavrinUserGUIDController.h"
+#include "tests/support/FeedbackFixture.h"
 
 namespace tavrin::test {
 namespace {
@@ -343,6 +347,83 @@ TEST_F(ConnectionTest, WarmsTheConnectionWhenASearchViewAppears)
             EXPECT_FALSE(warmed(event, false)) << "still warm";
         }
         device.advance(31s);
+    }
+}
+
+// ---- With real sessions
+
+struct RecordedConnectionTest : FeedbackTest {
+    /// The start records in the session files on disk, by their URL's path.
+    std::map<std::string, Value> startRecords()
+    {
+        std::map<std::string, Value> found;
+        for (const auto& [path, contents] : device.files.files) {
+            if (!path.filename().string().starts_with("session.")) continue;
+            ArchivedDataIterator records{platform::Bytes(contents)};
+            while (const auto archive = records.readNextObject()) {
+                const Value record = platform::valueFromArchive(*archive).value();
+                if (record["feedback"]["class"] == Value("ZRStartNetworkSearchFeedback"))
+                    found[platform::Url::parse(*record["feedback"]["url"].asString())->path()] = record;
+            }
+        }
+        return found;
+    }
+};
+
+TEST_F(RecordedConnectionTest, TheDaemonsOwnRequestsAreRecordedAsItsOwn)
+{
+    device.userDefaults.set("TAVSharedSession", false);
+    start();
+    deliverBag();
+    connection = client();
+    device.advance(31s);
+    report("ZRSearchViewAppearFeedback", {{"viewAppearEvent", 2}});
+    auto records = startRecords();
+    const struct {
+        const char* path;
+        int trigger, endpoint;
+    } expected[]{{"/bag", 16, 10}, {"/warm", 19, 12}};
+    for (const auto& [path, trigger, endpoint] : expected) {
+        const Value& record = records[path];
+        EXPECT_EQ(record["feedback"]["triggerEvent"], Value(trigger)) << path;
+        EXPECT_EQ(record["feedback"]["endpoint"], Value(endpoint)) << path;
+        EXPECT_EQ(record["feedback"]["input"], Value("")) << path;
+        EXPECT_EQ(record["user_agent"], Value(ClientSessionManager::tavrindUserAgent())) << path;
+        EXPECT_EQ(record["query_id"].asDouble().value_or(0), 0) << path;
+    }
+    EXPECT_EQ(records["/warm"]["user_guid"], Value(assembly().guidController->currentUserGUID().string()))
+        << "in the shared session, where the client has one of its own";
+}
+
+TEST_F(RecordedConnectionTest, EveryEventAndEverySearchNoticesAStaleBag)
+{
+    begin();
+    const auto fetches = [&] {
+        return std::ranges::count_if(
+            tasks(), [](const auto& task) { return !task->finished && task->originalRequest().url.path() == "/bag"; });
+    };
+    std::int64_t id = 0;
+    const std::pair<const char*, std::function<void()>> reads[]{
+        {"event", [&] { appear(); }},
+        {"search", [&] { (void)search(*connection, ++id, "weat"); }},
+    };
+    const std::pair<const char*, std::function<void()>> changes[]{
+        {"time", [&] { device.clock.setWall(device.clock.wallNow() + 14400s - 599s); }},
+        {"default", [&] { device.userDefaults.set("TAVBagURL", fmt::format("https://b{}.example/bag", ++id)); }},
+    };
+    for (const auto& [change, make] : changes) {
+        for (const auto& [read, perform] : reads) {
+            for (int i = 0; i < 2; ++i) {
+                perform();
+                EXPECT_EQ(fetches(), 0) << change << ", " << read << ": the bag is fresh";
+            }
+            make();
+            perform();
+            ASSERT_EQ(fetches(), 1) << change << ", " << read;
+            for (const auto& task : std::vector(tasks()))
+                if (!task->finished && task->originalRequest().url.path() == "/bag") task->respond(200, kFeedbackBag);
+            device.drain();
+        }
     }
 }
 
