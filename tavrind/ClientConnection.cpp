@@ -21,6 +21,7 @@
 #include "tavrind/ClientStateManager.h"
 #include "tavrind/DownloadManager.h"
 #include "tavrind/FeedbackClasses.h"
+#include "tavrind/RequestKind.h"
 #include "tavrind/TavrinBagController.h"
 #include "tavrind/TavrinFeedback.h"
 #include "tavrind/TavrinFeedbackFlusher.h"
@@ -40,27 +41,6 @@ constexpr std::array kWarmingEvents{
     SearchViewAppearTrigger::PullDownHomeScreen, SearchViewAppearTrigger::NotificationCenter,
     SearchViewAppearTrigger::PartialPullDown,
 };
-
-/// A request of any other class gets no reply.
-bool isServed(const TAVRequest& request)
-{
-    return dynamic_cast<const TAVSearchRequest*>(&request) || dynamic_cast<const TAVMoreResultsRequest*>(&request) ||
-           dynamic_cast<const TAVCardRequest*>(&request) || dynamic_cast<const TAVZeroKeywordRequest*>(&request) ||
-           dynamic_cast<const TAVLookupRequest*>(&request) || dynamic_cast<const TAVFlightLookupRequest*>(&request) ||
-           dynamic_cast<const TAVFlightSearchRequest*>(&request);
-}
-
-/// Wraps a reply so that its answer is also a trace point.
-RequestReply traced(RequestReply reply, TAVTraceCode answer)
-{
-    auto shared = std::make_shared<RequestReply>(std::move(reply));
-    return RequestReply(
-        [shared, answer](std::int64_t queryId, std::shared_ptr<TAVReply> record, OptionalError error) {
-            (*shared)(queryId, std::move(record), std::move(error));
-            TAVTrace(answer, static_cast<std::uint64_t>(queryId));
-        },
-        [shared] { shared->abandon(); });
-}
 
 } // namespace
 
@@ -143,15 +123,17 @@ void ClientConnection::configure(std::shared_ptr<TAVSessionConfiguration> config
                     if (auto connection = weak.lock())
                         connection->bagChangeNotification(notification.get<std::shared_ptr<const TAVBag>>("bag"));
                 });
-            // One may have come in between, too late for the answer and too early for the observer.
+            // A bag that arrived between the reply and the observer would otherwise never be pushed.
             const auto newest = self->_assembly.bagController->inMemoryBag();
-            if (newest && (!bag || newest->rawBag() != bag->rawBag())) self->_remoteObject->bagDidLoad(newest, {});
+            if (!userAgent.empty() && newest && (!bag || newest->rawBag() != bag->rawBag()))
+                self->_remoteObject->bagDidLoad(newest, {});
             self->_clientStateManager->saveState();
         }));
     reply(_clientStateManager->endpoint());
 }
 
-/// On the thread that installs the bag, which all readers of the bag wait for: the client is told from another.
+/// Runs on the thread that installs the bag, inside the controller's barrier, so the push is handed to the connection's
+/// queue.
 void ClientConnection::bagChangeNotification(std::shared_ptr<const TAVBag> bag)
 {
     TavrinLogForCategory(kLogBag).info("bag change notification: {}", bag ? bag->version() : "none");
@@ -186,56 +168,36 @@ void ClientConnection::_completeDefaults(TAVRequest& request) const
 void ClientConnection::request(std::shared_ptr<TAVRequest> request, RequestReply reply)
 {
     _ensureState();
-    if (!isServed(*request)) return reply.abandon();
+    const RequestKind* kind = kindOf(*request);
+    if (!kind) return reply.abandon();
     if (!_state) return reply(request->queryId, nullptr, makeTAVError(TAVErrorInvalidResponse, "client state nil"));
     _completeDefaults(*request);
 
     const auto queryId = static_cast<std::uint64_t>(request->queryId);
-    if (auto query = std::dynamic_pointer_cast<TAVSearchRequest>(request)) {
-        search(std::move(query), std::move(reply));
-    } else if (auto more = std::dynamic_pointer_cast<TAVMoreResultsRequest>(request)) {
-        _state->moreResults(std::move(more), std::move(reply));
-    } else if (auto card = std::dynamic_pointer_cast<TAVCardRequest>(request)) {
-        TAVTrace(kTraceCardStart, queryId);
-        _state->card(std::move(card), traced(std::move(reply), kTraceCardAnswer));
-    } else if (auto zkw = std::dynamic_pointer_cast<TAVZeroKeywordRequest>(request)) {
-        TAVTrace(kTraceZeroKeywordStart, queryId);
-        _state->zeroKeyword(std::move(zkw), traced(std::move(reply), kTraceZeroKeywordAnswer));
-    } else if (auto lookup = std::dynamic_pointer_cast<TAVLookupRequest>(request)) {
-        TAVTrace(kTraceLookupStart, queryId);
-        _state->lookup(std::move(lookup), traced(std::move(reply), kTraceLookupAnswer));
-    } else if (dynamic_cast<TAVFlightLookupRequest*>(request.get())) {
-        _state->flightLookup(std::move(request), std::move(reply));
-    } else {
-        _state->flightSearch(std::move(request), std::move(reply));
-    }
+    TAVTrace(kind->traceStart, queryId);
+    if (kind->traceAnswer != kTraceNone)
+        reply = std::move(reply).andThen([kind, queryId] { TAVTrace(kind->traceAnswer, queryId); });
+    if (kind->isSearch) return search(*kind, std::move(request), std::move(reply));
+    _state->perform(*kind, std::move(request), std::move(reply));
 }
 
-/// Only the newest query counts: one that is not above the highest id so far, and an answer that was overtaken, are
-/// answered empty.
-void ClientConnection::search(std::shared_ptr<TAVSearchRequest> request, RequestReply reply)
+/// Only the newest query counts: a query whose id is not above the highest so far gets an empty reply at once, and so
+/// does one that a newer query has overtaken when its answer comes.
+void ClientConnection::search(const RequestKind& kind, std::shared_ptr<TAVRequest> request, RequestReply reply)
 {
     const std::int64_t queryId = request->queryId;
-    TAVTrace(kTraceSearchStart, static_cast<std::uint64_t>(queryId));
-    RequestReply answer = traced(std::move(reply), kTraceSearchAnswer);
+    std::int64_t current = _currentQueryId;
+    if (queryId <= current || !_currentQueryId.compare_exchange_strong(current, queryId))
+        return reply(queryId, nullptr, {});
 
-    const bool accepted = [&] {
-        std::lock_guard order(_orderMutex);
-        std::int64_t current = _currentQueryId;
-        return queryId > current && _currentQueryId.compare_exchange_strong(current, queryId);
-    }();
-    if (!accepted) return answer(queryId, nullptr, {});
-
-    auto shared = std::make_shared<RequestReply>(std::move(answer));
-    _state->search(std::move(request),
-                   RequestReply([weak = weak_from_this(), queryId,
-                                 shared](std::int64_t, std::shared_ptr<TAVReply> record, OptionalError error) {
-                       auto self = weak.lock();
-                       if (!self) return shared->abandon();
-                       std::lock_guard order(self->_orderMutex);
-                       if (self->_currentQueryId > queryId) return (*shared)(queryId, nullptr, {});
-                       (*shared)(queryId, std::move(record), std::move(error));
-                   }));
+    RequestReply ordered([weak = weak_from_this(), queryId, reply = std::move(reply)](
+                             std::int64_t, std::shared_ptr<TAVReply> record, OptionalError error) mutable {
+        const auto self = weak.lock();
+        if (!self) return reply.abandon();
+        if (self->_currentQueryId > queryId) return reply(queryId, nullptr, {});
+        reply(queryId, std::move(record), std::move(error));
+    });
+    _state->perform(kind, std::move(request), std::move(ordered));
 }
 
 void ClientConnection::_reportOneOff(const platform::Error& error) const

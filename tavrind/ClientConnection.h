@@ -13,7 +13,7 @@
 namespace tavrin {
 
 struct Assembly;
-struct TAVSearchRequest;
+struct RequestKind;
 struct ZRCustomFeedback;
 class ClientState;
 class ClientStateManager;
@@ -21,9 +21,8 @@ class TavrinFlusherXPC;
 
 /// What one client connection talks to.
 ///
-/// It is bound to the state of its client by the first valid configuration, and to no other after that. Calls arrive on
-/// the connection's queue; the public rest is for any thread. Answers to searches come from any thread, and only the
-/// highest query id is written there.
+/// The first valid configuration binds it to the state of its client, for good. Calls of the protocol run on the
+/// connection's queue; all else: any thread. Answers to searches come on any thread and only read the highest query id.
 class ClientConnection : public TAVDaemonXPC, public std::enable_shared_from_this<ClientConnection> {
 public:
     /// `remoteObject` is the client's side of `connection`.
@@ -41,14 +40,14 @@ public:
     void listSessions(platform::Reply<platform::Value::Array> reply) override;
     void fileHandleAndAttributesForResource(const std::string& resource, ResourceReply reply) override;
 
-    /// Ends the client's session, then calls back; at once for a connection that never configured.
+    /// Ends the client's session, then calls back. A connection that never configured calls back at once.
     void flushSession(std::move_only_function<void()> callback);
-    /// As the connection has gone; the callback hears whether a session was flushed.
+    /// The same after the connection was invalidated; `flushed` says whether there was a session to flush.
     void flushSessionInvalidation(std::move_only_function<void(bool flushed)> callback);
 
     [[nodiscard]] const std::shared_ptr<platform::ipc::Connection>& connection() const { return _connection; }
     [[nodiscard]] std::int64_t currentQueryId() const { return _currentQueryId; }
-    /// Short name of the client; none before it configured, or for a client without one.
+    /// Short name of the client; none before it has configured, and for clients without one.
     [[nodiscard]] std::optional<std::string> clientShortName() const;
     /// Empty before the client has configured.
     [[nodiscard]] std::string userAgent() const;
@@ -57,7 +56,7 @@ private:
     void _ensureState();
     [[nodiscard]] std::shared_ptr<ClientState> _boundState() const;
     void _completeDefaults(TAVRequest& request) const;
-    void search(std::shared_ptr<TAVSearchRequest> request, RequestReply reply);
+    void search(const RequestKind& kind, std::shared_ptr<TAVRequest> request, RequestReply reply);
     void reportEvent(std::shared_ptr<ZRFeedback> feedback, std::int64_t queryId, std::shared_ptr<void> call);
     void handleCustomFeedback(std::shared_ptr<ZRCustomFeedback> feedback, std::int64_t queryId,
                               std::move_only_function<void()> callback);
@@ -69,12 +68,11 @@ private:
     std::shared_ptr<TAVClientXPC> _remoteObject;
     std::shared_ptr<platform::ipc::Connection> _connection;
     std::shared_ptr<TavrinFlusherXPC> _flusherListener;
-    mutable std::mutex _mutex; // for the two below, which are written on the connection's queue and read anywhere
+    mutable std::mutex _mutex; // guards the two below: written on the connection's queue, read on any thread
     std::shared_ptr<TAVSessionConfiguration> _configuration;
     std::shared_ptr<ClientState> _state;
-    std::mutex _orderMutex; // so that no query is accepted between an answer's check and its delivery
-    std::atomic<std::int64_t> _currentQueryId = 0;
-    std::atomic<bool> _reportedNoState = false; ///< one error session for a connection
+    std::atomic<std::int64_t> _currentQueryId = 0; // the highest accepted; only compare-and-swap raises it
+    std::atomic<bool> _reportedNoState = false;    ///< one error session for a connection
     platform::NotificationCenter::Token _bagObserver;
 };
 

@@ -3,15 +3,17 @@
 #include "CoreTavrin/ClientVocabulary.h"
 #include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVError.h"
-#include "CoreTavrin/TAVSessionConfiguration.h"
+#include "CoreTavrin/TAVRequest.h"
 #include "platform/device/Device.h"
 #include "platform/files/UserDefaults.h"
 #include "platform/run/Clock.h"
 #include "searchrecords/ZRNetworkFeedback.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/ClientSessionManager.h"
+#include "tavrind/Exchange.h"
 #include "tavrind/FeedbackRecords.h"
 #include "tavrind/QueryCache.h"
+#include "tavrind/RequestKind.h"
 #include "tavrind/TAVNetworkRequestFactory.h"
 #include "tavrind/TavrinBagController.h"
 #include "tavrind/TavrinFeedback.h"
@@ -40,8 +42,8 @@ const platform::Log& log()
 
 ClientState::ClientState(std::string identifier, Assembly& assembly)
     : _assembly(assembly), _identifier(std::move(identifier)), _clientShortName(shortName(_identifier)),
-      _answersQueue(assembly.device.serialQueue("com.quorvane.tavrind.answers")),
-      _queue(assembly.device.serialQueue("com.quorvane.tavrind.clientState"))
+      _queue(assembly.device.serialQueue("com.quorvane.tavrind.clientState")),
+      _bagFetch(std::make_shared<platform::Event>())
 {
     if (assembly.userDefaults.boolean("TAVNoQueryCache")) {
         log().log("query cache OFF for {}", _identifier);
@@ -70,37 +72,32 @@ std::shared_ptr<TavrinUserGUIDController> ClientState::guidController() const
     return _ownGuidController ? _ownGuidController : _assembly.guidController;
 }
 
-std::optional<std::string> ClientState::userAgent() const
+ClientView ClientState::view() const
 {
-    return _queue->sync([this] { return _userAgent; });
+    return _queue->sync([this] { return _view; });
 }
 
 void ClientState::setUserAgent(std::string userAgent)
 {
-    _queue->sync([&] { _userAgent = std::move(userAgent); });
+    _queue->sync([&] { _view.userAgent = std::move(userAgent); });
 }
 
-void ClientState::setConfiguration(std::shared_ptr<TAVSessionConfiguration> configuration)
+void ClientState::setConfiguration(std::shared_ptr<const TAVSessionConfiguration> configuration)
 {
-    _queue->sync([&] { _configuration = std::move(configuration); });
-}
-
-std::shared_ptr<const TAVBag> ClientState::bag() const
-{
-    return _queue->sync([this] { return _bag; });
+    _queue->sync([&] { _view.configuration = std::move(configuration); });
 }
 
 void ClientState::bag(const std::optional<std::string>& userAgent, BagReply reply)
 {
     const bool known = _queue->sync([&] {
-        if (userAgent && !userAgent->empty() && userAgent != _userAgent) {
-            _userAgent = userAgent;
-            if (_bag) {
-                _bag = std::make_shared<const TAVBag>(_bag->rawBag(), *_userAgent);
+        if (userAgent && !userAgent->empty() && userAgent != _view.userAgent) {
+            _view.userAgent = userAgent;
+            if (_view.bag) {
+                _view.bag = std::make_shared<const TAVBag>(_view.bag->rawBag(), *_view.userAgent);
                 if (_queryCache) _queryCache->removeAllObjects();
             }
         }
-        return _userAgent.has_value();
+        return _view.userAgent.has_value();
     });
     if (!known) return reply(nullptr, makeTAVError(TAVErrorTimeout, "no UserAgent"));
 
@@ -113,19 +110,19 @@ void ClientState::bag(const std::optional<std::string>& userAgent, BagReply repl
 void ClientState::_ensureBag(std::move_only_function<void(bool)> then)
 {
     enum class State { NoAgent, Held, Missing };
-    const State state = _queue->sync([this] {
-        if (!_userAgent) return State::NoAgent;
-        if (_bag) return State::Held;
-        log().log("Warming bag cache for agent: {}", *_userAgent);
+    // The fetch is taken before the bag is asked for: it may end at any moment from then on.
+    const auto [state, fetch] = _queue->sync([this] {
+        if (!_view.userAgent) return std::pair(State::NoAgent, _bagFetch);
+        if (_view.bag) return std::pair(State::Held, _bagFetch);
+        log().log("Warming bag cache for agent: {}", *_view.userAgent);
         if (!_bagObserver) {
             _bagObserver = _assembly.notificationCenter.observe(
                 TAVBagChangeNotification, [weak = weak_from_this()](const platform::Notification& notification) {
-                    const auto bag = notification.get<std::shared_ptr<const TAVBag>>("bag");
-                    auto self = weak.lock();
-                    if (self && bag) self->bagChangeNotification(bag);
+                    if (auto self = weak.lock())
+                        self->bagChangeNotification(notification.get<std::shared_ptr<const TAVBag>>("bag"));
                 });
         }
-        return State::Missing;
+        return std::pair(State::Missing, _bagFetch);
     });
     if (state != State::Missing) return then(state == State::Held);
 
@@ -136,23 +133,25 @@ void ClientState::_ensureBag(std::move_only_function<void(bool)> then)
 
     _markNetworkRequest();
     platform::Queue::current()->suspendUntil(
-        _bagArrived, kBagWait,
+        *fetch, kBagWait,
         [self = shared_from_this(), then = std::move(then)]() mutable { then(self->bag() != nullptr); });
 }
 
-/// Unless a newer one has been announced since it was read.
+/// Does nothing if a newer bag has been announced since this one was read.
 void ClientState::_storeBagFrom(const TAVBag& bag)
 {
     _queue->sync([&] {
-        if (!_bag) _bag = std::make_shared<const TAVBag>(bag.rawBag(), *_userAgent);
+        if (!_view.bag) _view.bag = std::make_shared<const TAVBag>(bag.rawBag(), *_view.userAgent);
     });
 }
 
+/// A null bag stands for a failed fetch: whoever waits now goes on without a bag; whoever comes later waits for the
+/// next fetch.
 void ClientState::bagChangeNotification(const std::shared_ptr<const TAVBag>& bag)
 {
     _queue->async([self = shared_from_this(), bag] {
-        self->_bag = std::make_shared<const TAVBag>(bag->rawBag(), *self->_userAgent);
-        self->_bagArrived.signal();
+        if (bag) self->_view.bag = std::make_shared<const TAVBag>(bag->rawBag(), *self->_view.userAgent);
+        std::exchange(self->_bagFetch, std::make_shared<platform::Event>())->signal();
     });
 }
 
@@ -187,23 +186,15 @@ void ClientState::_markNetworkRequest()
     _queue->async([self = shared_from_this(), now] { self->_lastNetworkRequest = now; });
 }
 
-/// Reading it may roll it, which empties query caches: only a request that is about to be made reads it.
-platform::Uuid ClientState::_currentUserGUID() const
+void ClientState::perform(const RequestKind& kind, std::shared_ptr<TAVRequest> request, RequestReply reply)
 {
-    const auto controller = guidController();
-    return controller ? controller->currentUserGUID() : platform::Uuid();
+    std::make_shared<Exchange>(_assembly, shared_from_this(), kind, std::move(request), std::move(reply))->begin();
 }
 
-void ClientState::_setPerformedSearch()
+void ClientState::_perform(std::shared_ptr<TAVRequest> request, RequestReply reply)
 {
-    _assembly.requestFactory->setPerformedSearch();
-}
-
-std::optional<platform::Duration> ClientState::_requestTimeout() const
-{
-    const double seconds =
-        _queue->sync([this] { return _configuration ? _configuration->timeoutIntervalForRequest : 0; });
-    return seconds > 0 ? std::optional(requestTimeout(seconds)) : std::nullopt;
+    const RequestKind& kind = *kindOf(*request);
+    perform(kind, std::move(request), std::move(reply));
 }
 
 } // namespace tavrin

@@ -11,6 +11,7 @@
 #include "platform/values/ValueCoder.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/ClientState.h"
+#include "tavrind/RequestKind.h"
 #include "tavrind/TavrinLogging.h"
 
 namespace tavrin {
@@ -128,12 +129,9 @@ void ClientStateManager::request(std::shared_ptr<TAVRequest> request,
         return reply(request->queryId, nullptr,
                      makeTAVError(TAVErrorInvalidResponse, fmt::format("invalid configuration {}", description)));
     }
-    if (auto more = std::dynamic_pointer_cast<TAVMoreResultsRequest>(request))
-        state->moreResults(more, std::move(reply));
-    else if (auto card = std::dynamic_pointer_cast<TAVCardRequest>(request))
-        state->card(card, std::move(reply));
-    else
-        reply.abandon();
+    const RequestKind* kind = kindOf(*request);
+    if (!kind || !kind->servedOnEndpoint) return reply.abandon();
+    state->perform(*kind, std::move(request), std::move(reply));
 }
 
 } // namespace tavrin

@@ -75,13 +75,27 @@ std::shared_ptr<const CachedResultSet> QueryCache::getRequest(const TAVRequest& 
     });
 }
 
+bool QueryCache::_isKept(const CachedResultSet& set)
+{
+    if (set.query.empty() || set.query.contains('\0')) return false;
+    if (set.inputLength <= set.queryLength) return true;
+    log().error("BUG: NOT caching '{}' because input is longer than completed query '{}'", set.input, set.query);
+    return false;
+}
+
 void QueryCache::set(std::shared_ptr<const CachedResultSet> set)
 {
-    if (set->query.empty() || set->query.contains('\0')) return;
-    if (set->inputLength > set->queryLength)
-        return log().error("BUG: NOT caching '{}' because input is longer than completed query '{}'", set->input,
-                           set->query);
-    _queue->async([self = shared_from_this(), set = std::move(set)]() mutable { self->_store(std::move(set)); });
+    if (_isKept(*set))
+        _queue->async([self = shared_from_this(), set = std::move(set)]() mutable { self->_store(std::move(set)); });
+}
+
+void QueryCache::setMade(std::move_only_function<std::vector<std::shared_ptr<const CachedResultSet>>()> make,
+                         std::uint64_t generation)
+{
+    _queue->async([self = shared_from_this(), make = std::move(make), generation]() mutable {
+        for (auto& set : make())
+            if (self->_generation == generation && _isKept(*set)) self->_store(std::move(set));
+    });
 }
 
 void QueryCache::_store(std::shared_ptr<const CachedResultSet> set)
@@ -102,6 +116,7 @@ void QueryCache::_store(std::shared_ptr<const CachedResultSet> set)
 
 void QueryCache::removeAllObjects()
 {
+    ++_generation;
     _queue->async([self = shared_from_this()] {
         self->_clearCache();
         self->_source.reset();
@@ -127,7 +142,7 @@ void QueryCache::_startListeningForMemoryPressure()
         auto self = weak.lock();
         if (!self) return;
         self->_queue->async([self] {
-            if (!self->_source) return; // stopped meanwhile
+            if (!self->_source) return; // cleared meanwhile
             log().log("emptying cache under memory pressure");
             self->_clearCache();
             self->_source.reset();

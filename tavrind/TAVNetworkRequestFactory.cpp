@@ -38,7 +38,7 @@ const platform::Log& log()
     return TavrinLogForCategory(kLogRequest);
 }
 
-// The kinds of request, as bits: a rule of the table below names those that it applies to.
+// The kinds of request as bits: each rule of the table below names the kinds that it applies to.
 enum Kind : unsigned {
     kBagFetch = 1 << 0,
     kBagCache = 1 << 1,
@@ -57,19 +57,17 @@ constexpr unsigned kClient = kSearch | kZeroKeyword | kMoreResults | kLookup | k
 
 /// What one request is made of, beside the context.
 struct TAVNetworkRequestFactory::Recipe {
-    Kind kind;
+    unsigned kind;
     TavrinURLRequestBuilder builder;
-    const TAVRequest* request = nullptr;
-    const TAVBag* bag = nullptr;
-    Uuid userGuid;
-    std::uint64_t fieldMask = 0;
-    std::string userAgent;
-    std::string version;
-    std::string digest;
+    const ClientRequest* client = nullptr; // of the kinds in kClient
+    std::string userAgent = {};
+    std::string version = {};
+    std::string digest = {};
     bool includeLatLong = false;
-    std::string signature; // of the installed applications
-    std::optional<Duration> timeout;
+    std::optional<Duration> timeout = {};
+    std::string signature = {}; // of the installed applications
 
+    [[nodiscard]] const TAVRequest& request() const { return client->request; }
     void item(const char* name, const std::string& value)
     {
         if (!value.empty()) builder.defaultQueryItemWithName(name, value);
@@ -80,12 +78,12 @@ struct TAVNetworkRequestFactory::Recipe {
     }
     [[nodiscard]] bool masked() const
     {
-        return (fieldMask & kFieldMaskNoLocation) && (kind & (kSearch | kZeroKeyword | kMoreResults));
+        return (client->fieldMask & kFieldMaskNoLocation) && (kind & (kSearch | kZeroKeyword | kMoreResults));
     }
 
     static void addLookupItems(Recipe& r, const RequestContext&);
 
-    /// One shared item or header: for which kinds, and how it is made. An empty value is left out.
+    /// A shared item or header: the kinds that carry it, and how it is added. Empty values are left out.
     struct Rule {
         unsigned kinds;
         void (*apply)(Recipe&, const RequestContext&);
@@ -105,10 +103,10 @@ const std::vector<TAVNetworkRequestFactory::Recipe::Rule> TAVNetworkRequestFacto
     {kSearch, [](auto& r, auto&) { r.item("card", "1"); }},
     {kSearch,
      [](auto& r, auto&) {
-         if (r.request->topics.count() > 0) r.header("X-Quorvane-TopTopics", platform::toJson(r.request->topics));
+         if (r.request().topics.count() > 0) r.header("X-Quorvane-TopTopics", platform::toJson(r.request().topics));
      }},
     {kSearch | kZeroKeyword | kLookup | kFlight,
-     [](auto& r, auto&) { r.item("kb_ime", r.request->keyboardInputMode.value_or("")); }},
+     [](auto& r, auto&) { r.item("kb_ime", r.request().keyboardInputMode.value_or("")); }},
     {kSearch | kZeroKeyword,
      [](auto& r, auto& c) {
          r.item("calendar", c.localeCalendarIdentifier);
@@ -132,17 +130,18 @@ const std::vector<TAVNetworkRequestFactory::Recipe::Rule> TAVNetworkRequestFacto
     {kClient, [](auto& r, auto& c) { r.header("X-Quorvane-Subscriptions", c.subscriptionInfo); }},
     {kClient,
      [](auto& r, auto& c) {
-         const Uuid& guid = r.userGuid.isNil() ? c.userGuid : r.userGuid;
+         const Uuid& guid = r.client->userGuid.isNil() ? c.userGuid : r.client->userGuid;
          if (!guid.isNil()) r.header("X-Quorvane-UserGuid", guid.string());
      }},
     {kBagFetch | kClient | kDownload | kUpload, [](auto& r, auto&) { r.header("User-Agent", r.userAgent); }},
     {kClient,
      [](auto& r, auto&) {
-         if (r.request->scale > 0) r.header("X-Quorvane-UI-Scale", fmt::format("{:.1f}", r.request->scale));
+         if (r.request().scale > 0) r.header("X-Quorvane-UI-Scale", fmt::format("{:.1f}", r.request().scale));
      }},
     {kSearch | kZeroKeyword | kCard,
      [](auto& r, auto& c) {
-         if (r.bag && r.bag->sendGeoEnvironmentHeader()) r.header("X-Quorvane-GeoEnvironment", c.geoEnvironment);
+         if (r.client->bag && r.client->bag->sendGeoEnvironmentHeader())
+             r.header("X-Quorvane-GeoEnvironment", c.geoEnvironment);
      }},
     {kClient & ~kMoreResults, [](auto& r, auto& c) { r.header("X-Quorvane-GeoSession", c.geoSessionId); }},
     {kLookup, &Recipe::addLookupItems},
@@ -156,7 +155,7 @@ const std::vector<TAVNetworkRequestFactory::Recipe::Rule> TAVNetworkRequestFacto
 
 void TAVNetworkRequestFactory::Recipe::addLookupItems(Recipe& r, const RequestContext&)
 {
-    const auto& lookup = static_cast<const TAVLookupRequest&>(*r.request);
+    const auto& lookup = static_cast<const TAVLookupRequest&>(r.request());
     const auto language = [](const std::string& text) {
         std::string recognized = platform::recognizedLanguage(text);
         return recognized == "und" ? std::string() : recognized;
@@ -176,7 +175,7 @@ std::shared_ptr<TAVNetworkRequestFactory> TAVNetworkRequestFactory::make(Assembl
     const std::weak_ptr<TAVNetworkRequestFactory> weak = factory;
     platform::Device& device = assembly.device;
 
-    // What requests carry is computed off the start-up path; the first recipe waits behind it on the queue.
+    // Off the start-up path: the first recipe waits for this task on the queue.
     factory->_contextAccessQueue->barrierAsync([weak] {
         auto self = weak.lock();
         if (!self) return;
@@ -198,7 +197,7 @@ std::shared_ptr<TAVNetworkRequestFactory> TAVNetworkRequestFactory::make(Assembl
             }
             again->_updateLocale();
             again->_post(TAVLocaleChangeNotification);
-            // The country may be the locale's.
+            // Without a configured country, the country is the locale's region.
             if (again->_updateProfile(again->_assembly.device.profile.profile()))
                 again->_post(TAVCountryCodeChangeNotification);
             again->_notifyBagRefreshRequired();
@@ -246,13 +245,13 @@ TAVNetworkRequestFactory::~TAVNetworkRequestFactory() = default;
 
 UrlRequest TAVNetworkRequestFactory::build(Recipe& recipe)
 {
-    // Asked for before the queue is entered: the controllers have queues of their own.
+    // Read before the context queue is entered: the controller has a queue of its own.
     if ((recipe.kind & kClient & ~kZeroKeyword) && _assembly.appWhitelistController)
         recipe.signature = _assembly.appWhitelistController->whitelistSignature();
 
     UrlRequest request = _contextAccessQueue->sync([&] {
-        if (recipe.request)
-            for (const auto& item : recipe.request->queryItems)
+        if (recipe.client)
+            for (const auto& item : recipe.request().queryItems)
                 if (item) recipe.builder.forceQueryItemWithName(item->name, item->value);
         if (recipe.kind != kDownload) recipe.builder.forceQueryItemsFromArray(_context.debuggingQueryItems);
         for (const Recipe::Rule& rule : Recipe::kRules)
@@ -261,8 +260,6 @@ UrlRequest TAVNetworkRequestFactory::build(Recipe& recipe)
     });
 
     request.timeout = recipe.timeout;
-    if (!request.timeout && recipe.bag)
-        if (const auto seconds = recipe.bag->timeoutIntervalForRequest()) request.timeout = requestTimeout(*seconds);
     return request;
 }
 
@@ -270,9 +267,10 @@ UrlRequest TAVNetworkRequestFactory::bagFetchRequest(const TavrinBagController& 
                                                      const std::string& userAgent, const std::string& version)
 {
     const Url url = controller.bagFetchURLWithCountry(_deviceCountryCode());
-    Recipe recipe{.kind = kBagFetch, .builder = TavrinURLRequestBuilder::requestBuilderWithURL(url)};
-    recipe.userAgent = userAgent;
-    recipe.version = version;
+    Recipe recipe{.kind = kBagFetch,
+                  .builder = TavrinURLRequestBuilder::requestBuilderWithURL(url),
+                  .userAgent = userAgent,
+                  .version = version};
     UrlRequest request = build(recipe);
     request.cachePolicy = UrlRequest::CachePolicy::ReloadIgnoringCache;
     return request;
@@ -282,128 +280,85 @@ UrlRequest TAVNetworkRequestFactory::bagCacheRequest(const TavrinBagController& 
                                                      const std::string& userAgent, const std::string& version)
 {
     const Url url = controller.bagFetchURLWithCountry(_deviceCountryCode());
-    Recipe recipe{.kind = kBagCache, .builder = TavrinURLRequestBuilder::requestBuilderWithURL(url)};
-    recipe.userAgent = userAgent;
-    recipe.version = version;
+    Recipe recipe{.kind = kBagCache,
+                  .builder = TavrinURLRequestBuilder::requestBuilderWithURL(url),
+                  .userAgent = userAgent,
+                  .version = version};
     return build(recipe);
 }
 
-namespace {
-
-bool isSuggested(const TAVRequest& request)
+TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::_clientRequest(unsigned kind, const ClientRequest& client,
+                                                                           const std::optional<Url>& url,
+                                                                           const std::vector<QueryItem>& forced)
 {
-    return request.triggerEvent == StartSearchTrigger::Suggestion ||
-           request.triggerEvent == StartSearchTrigger::PartialSuggestion;
-}
-
-} // namespace
-
-TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::searchRequest(const TAVRequest& request, const TAVBag& bag,
-                                                                          const Uuid& userGuid, std::uint64_t fieldMask,
-                                                                          std::optional<Duration> timeout)
-{
-    const auto url = bag.searchURL();
     if (!url) return std::nullopt;
-    _startLocationUpdate();
-    Recipe recipe{
-        kSearch,        TavrinURLRequestBuilder::requestBuilderWithURL(*url), &request, &bag, userGuid, fieldMask,
-        bag.userAgent()};
-    recipe.timeout = timeout;
-    recipe.builder.forceQueryItemWithName("q", request.queryString);
-    if (isSuggested(request)) recipe.builder.forceQueryItemWithName("qtype", "suggested");
+    Recipe recipe{.kind = kind,
+                  .builder = TavrinURLRequestBuilder::requestBuilderWithURL(*url),
+                  .client = &client,
+                  .userAgent = client.userAgent,
+                  .timeout = client.timeout};
+    // The URL of more results says where its search was made, if the search did.
+    const bool placed = kind == kMoreResults && recipe.builder.containsQueryItemWithName("latlng");
+    if (kind != kCard && !placed) _startLocationUpdate();
+    recipe.builder.forceQueryItemsFromArray(forced);
+    if (!recipe.timeout && client.bag)
+        if (const auto seconds = client.bag->timeoutIntervalForRequest()) recipe.timeout = requestTimeout(*seconds);
     return build(recipe);
 }
 
-TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::zeroKeywordRequest(const TAVRequest& request,
-                                                                               const TAVBag& bag, const Uuid& userGuid,
-                                                                               std::uint64_t fieldMask,
-                                                                               std::optional<Duration> timeout)
+TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::searchRequest(const ClientRequest& client)
 {
-    const auto url = bag.searchURL();
-    if (!url) return std::nullopt;
-    _startLocationUpdate();
-    Recipe recipe{
-        kZeroKeyword,   TavrinURLRequestBuilder::requestBuilderWithURL(*url), &request, &bag, userGuid, fieldMask,
-        bag.userAgent()};
-    recipe.timeout = timeout;
-    recipe.builder.forceQueryItemWithName("qtype", "zkw");
-    return build(recipe);
+    std::vector<QueryItem> forced{{"q", client.request.queryString}};
+    if (client.request.triggerEvent == StartSearchTrigger::Suggestion ||
+        client.request.triggerEvent == StartSearchTrigger::PartialSuggestion)
+        forced.emplace_back("qtype", "suggested");
+    return _clientRequest(kSearch, client, client.bag->searchURL(), forced);
 }
 
-TAVNetworkRequestFactory::Request
-TAVNetworkRequestFactory::moreResultsRequest(const TAVMoreResultsRequest& request, const TAVBag* bag,
-                                             const std::optional<std::string>& userAgent, const Uuid& userGuid,
-                                             std::uint64_t fieldMask, std::optional<Duration> timeout)
+TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::zeroKeywordRequest(const ClientRequest& client)
 {
-    if (!request.moreResultsURL) return std::nullopt;
-    Recipe recipe{kMoreResults,
-                  TavrinURLRequestBuilder::requestBuilderWithURL(*request.moreResultsURL),
-                  &request,
-                  bag,
-                  userGuid,
-                  fieldMask,
-                  userAgent.value_or("")};
-    recipe.timeout = timeout;
-    if (!recipe.builder.containsQueryItemWithName("latlng")) _startLocationUpdate();
-    return build(recipe);
+    return _clientRequest(kZeroKeyword, client, client.bag->searchURL(), {{"qtype", "zkw"}});
 }
 
-TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::lookupRequest(const TAVLookupRequest& request,
-                                                                          const TAVBag& bag, const Uuid& userGuid,
-                                                                          std::optional<Duration> timeout)
+TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::moreResultsRequest(const ClientRequest& client)
 {
-    const auto url = bag.searchURL();
-    if (!url) return std::nullopt;
-    _startLocationUpdate();
-    Recipe recipe{kLookup,        TavrinURLRequestBuilder::requestBuilderWithURL(*url), &request, &bag, userGuid, 0,
-                  bag.userAgent()};
-    recipe.timeout = timeout;
-    recipe.builder.forceQueryItemWithName("q", request.queryString);
-    return build(recipe);
+    const auto& request = static_cast<const TAVMoreResultsRequest&>(client.request);
+    return _clientRequest(kMoreResults, client, request.moreResultsURL, {});
 }
 
-TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::cardRequest(const TAVCardRequest& request,
-                                                                        const TAVBag& bag, const Uuid& userGuid,
-                                                                        std::optional<Duration> timeout)
+TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::lookupRequest(const ClientRequest& client)
 {
-    if (!request.cardURL) return std::nullopt;
-    Recipe recipe{
-        kCard,          TavrinURLRequestBuilder::requestBuilderWithURL(*request.cardURL), &request, &bag, userGuid, 0,
-        bag.userAgent()};
-    recipe.timeout = timeout;
-    return build(recipe);
+    return _clientRequest(kLookup, client, client.bag->searchURL(), {{"q", client.request.queryString}});
 }
 
-TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::flightRequest(const TAVRequest& request, const TAVBag& bag,
-                                                                          const Uuid& userGuid,
-                                                                          std::optional<Duration> timeout)
+TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::cardRequest(const ClientRequest& client)
 {
-    const auto url = bag.flightURL();
-    if (!url) return std::nullopt;
-    _startLocationUpdate();
-    Recipe recipe{kFlight,        TavrinURLRequestBuilder::requestBuilderWithURL(*url), &request, &bag, userGuid, 0,
-                  bag.userAgent()};
-    recipe.timeout = timeout;
-    recipe.builder.forceQueryItemWithName("q", request.queryString);
-    return build(recipe);
+    return _clientRequest(kCard, client, static_cast<const TAVCardRequest&>(client.request).cardURL, {});
+}
+
+TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::flightRequest(const ClientRequest& client)
+{
+    return _clientRequest(kFlight, client, client.bag->flightURL(), {{"q", client.request.queryString}});
 }
 
 UrlRequest TAVNetworkRequestFactory::fileDownloadRequest(const Url& url, const std::string& version,
                                                          bool includeLatLong)
 {
-    Recipe recipe{.kind = kDownload, .builder = TavrinURLRequestBuilder::requestBuilderWithURL(url)};
-    recipe.userAgent = kDownloadUserAgent;
-    recipe.version = version;
-    recipe.includeLatLong = includeLatLong;
+    Recipe recipe{.kind = kDownload,
+                  .builder = TavrinURLRequestBuilder::requestBuilderWithURL(url),
+                  .userAgent = kDownloadUserAgent,
+                  .version = version,
+                  .includeLatLong = includeLatLong};
     return build(recipe);
 }
 
 UrlRequest TAVNetworkRequestFactory::flusherUploadRequest(const Url& url, Duration timeout, const std::string& digest)
 {
-    Recipe recipe{.kind = kUpload, .builder = TavrinURLRequestBuilder::requestBuilderWithURL(url)};
-    recipe.userAgent = ClientSessionManager::tavrindUserAgent();
-    recipe.digest = digest;
-    recipe.timeout = timeout;
+    Recipe recipe{.kind = kUpload,
+                  .builder = TavrinURLRequestBuilder::requestBuilderWithURL(url),
+                  .userAgent = ClientSessionManager::tavrindUserAgent(),
+                  .digest = digest,
+                  .timeout = timeout};
     UrlRequest request = build(recipe);
     request.method = "POST";
     request.headers.set("Content-Encoding", "deflate");
@@ -486,7 +441,7 @@ void TAVNetworkRequestFactory::_updateTimeZone()
     _context.localTimeZoneName = _assembly.device.locale.timeZone();
 }
 
-/// True if the country is another now.
+/// Returns whether the country has changed.
 bool TAVNetworkRequestFactory::_updateProfile(const platform::DeviceProfile& profile)
 {
     const std::string before = std::exchange(_context.geoDeviceCountryCode,

@@ -22,26 +22,23 @@ struct DeviceProfile;
 namespace tavrin {
 
 struct Assembly;
-struct TAVCardRequest;
-struct TAVLookupRequest;
-struct TAVMoreResultsRequest;
 struct TAVRequest;
 class TAVBag;
 class TavrinBagController;
 
 /// Posted by the request factory when the device has moved to another area; see `platform::isSignificantMove`.
 inline constexpr const char* TAVSignificantLocationChange = "TAVSignificantLocationChange";
-/// Posted once requests tell of the change, from a task of the factory's queue; no object, no user info.
+/// Posted from a task of the factory's queue once requests reflect the change; no object, no user info.
 inline constexpr const char* TAVLocaleChangeNotification = "TAVLocaleChangeNotification";
 inline constexpr const char* TAVTimeZoneChangeNotification = "TAVTimeZoneChangeNotification";
 inline constexpr const char* TAVCountryCodeChangeNotification = "TAVCountryCodeChangeNotification";
-/// Something in the device's profile changed.
+/// Any field of the device's profile changed. Posted like those above.
 inline constexpr const char* TAVEffectiveSettingsChangeNotification = "TAVEffectiveSettingsChangeNotification";
 
-/// Bit of a field mask: leave out where the device is and which applications it has.
+/// Bit of a field mask: leave out the device's location and its installed applications.
 inline constexpr std::uint64_t kFieldMaskNoLocation = 1;
 
-/// What requests tell of the device. Empty texts are left out of requests.
+/// The device as requests describe it. An empty text is left out of requests.
 struct RequestContext {
     std::string localeIdentifier;
     std::string effectiveSystemLanguage;
@@ -53,7 +50,7 @@ struct RequestContext {
     std::string geoDeviceCountryCode;
     std::string geoLocationLatLng;
     std::string geoLocationSource;
-    std::string lookupGeoLocationLatLng; ///< the location as of the last search that was sent
+    std::string lookupGeoLocationLatLng; ///< the location when the last search was sent
     std::string storeFrontIdentifier;
     bool isManagedAccount = false;
     std::string subscriptionInfo; ///< JSON array
@@ -61,8 +58,18 @@ struct RequestContext {
     std::string geoEnvironment;
     std::string geoSessionId;
     std::string geoSessionEntity;
-    platform::Uuid userGuid; ///< for requests that bring none
+    platform::Uuid userGuid; ///< for client requests with a nil GUID
     std::vector<platform::QueryItem> debuggingQueryItems;
+};
+
+/// A client's request, and what of the client goes into it. Refers to its parts; lives as long as the call.
+struct ClientRequest {
+    const TAVRequest& request;
+    const TAVBag* bag = nullptr; ///< may be null for more results only
+    platform::Uuid userGuid;
+    std::string userAgent;
+    std::uint64_t fieldMask = 0;               ///< of search, zero keyword and more results; others ignore it
+    std::optional<platform::Duration> timeout; ///< the client's; none leaves it to the bag
 };
 
 /// Builds every HTTP request that the daemon sends to the service.
@@ -70,9 +77,9 @@ struct RequestContext {
 /// Each kind of request is a recipe: a URL, the items that it forces, the request's own items, and then the shared
 /// items and headers of the table in the .cpp, as defaults. A recipe runs in one synchronous block on the context
 /// queue, so a request sees one consistent snapshot of the context. The factory keeps that context current from the
-/// device's locale, time zone, profile, location and subscriptions, and says when a change affects the bag.
+/// device's locale, time zone, profile, location and subscriptions, and announces changes that affect the bag.
 ///
-/// Operations whose URL may be missing answer none for it. Any thread.
+/// Any thread.
 class TAVNetworkRequestFactory : public std::enable_shared_from_this<TAVNetworkRequestFactory>,
                                  public TavrinSubscriptionManagerDelegate {
 public:
@@ -85,31 +92,24 @@ public:
 
     [[nodiscard]] platform::UrlRequest bagFetchRequest(const TavrinBagController& controller,
                                                        const std::string& userAgent, const std::string& version);
-    /// Never sent: its URL tells when the bag must be fetched anew.
+    /// Never sent: the bag is stale if this URL differs from that of the time of its fetch.
     [[nodiscard]] platform::UrlRequest bagCacheRequest(const TavrinBagController& controller,
                                                        const std::string& userAgent, const std::string& version);
 
     /// Changes with everything of the context that the URL of a bag request is made of.
     [[nodiscard]] std::uint64_t bagContextGeneration() const { return _bagContextGeneration; }
 
-    // A client's requests. The bag carries the client's user agent; `timeout` is the client's, if it has one.
-    [[nodiscard]] Request searchRequest(const TAVRequest& request, const TAVBag& bag, const platform::Uuid& userGuid,
-                                        std::uint64_t fieldMask = 0, std::optional<platform::Duration> timeout = {});
-    [[nodiscard]] Request zeroKeywordRequest(const TAVRequest& request, const TAVBag& bag,
-                                             const platform::Uuid& userGuid, std::uint64_t fieldMask = 0,
-                                             std::optional<platform::Duration> timeout = {});
-    /// The bag may be missing; hence the agent.
-    [[nodiscard]] Request moreResultsRequest(const TAVMoreResultsRequest& request, const TAVBag* bag,
-                                             const std::optional<std::string>& userAgent,
-                                             const platform::Uuid& userGuid, std::uint64_t fieldMask = 0,
-                                             std::optional<platform::Duration> timeout = {});
-    [[nodiscard]] Request lookupRequest(const TAVLookupRequest& request, const TAVBag& bag,
-                                        const platform::Uuid& userGuid, std::optional<platform::Duration> timeout = {});
-    [[nodiscard]] Request cardRequest(const TAVCardRequest& request, const TAVBag& bag, const platform::Uuid& userGuid,
-                                      std::optional<platform::Duration> timeout = {});
+    // A client's requests. Each returns none if the URL is missing in the bag or the request.
+    [[nodiscard]] Request searchRequest(const ClientRequest& client);
+    [[nodiscard]] Request zeroKeywordRequest(const ClientRequest& client);
+    /// Takes a `TAVMoreResultsRequest`.
+    [[nodiscard]] Request moreResultsRequest(const ClientRequest& client);
+    /// Takes a `TAVLookupRequest`.
+    [[nodiscard]] Request lookupRequest(const ClientRequest& client);
+    /// Takes a `TAVCardRequest`.
+    [[nodiscard]] Request cardRequest(const ClientRequest& client);
     /// A flight search or flight lookup.
-    [[nodiscard]] Request flightRequest(const TAVRequest& request, const TAVBag& bag, const platform::Uuid& userGuid,
-                                        std::optional<platform::Duration> timeout = {});
+    [[nodiscard]] Request flightRequest(const ClientRequest& client);
 
     [[nodiscard]] platform::UrlRequest fileDownloadRequest(const platform::Url& url, const std::string& version,
                                                            bool includeLatLong);
@@ -118,9 +118,9 @@ public:
                                                             const std::string& digest);
     [[nodiscard]] platform::UrlRequest warmRequest(const platform::Url& url);
 
-    /// Keeps the current location for file downloads; called after each network search.
+    /// Keeps the current location for file downloads. To be called after each network search.
     void setPerformedSearch();
-    /// The geo service's session entity, if there is a session.
+    /// The session entity of the device's geo service; none if it has no session.
     [[nodiscard]] std::optional<std::string> getMapsUserSessionEntity();
 
     void didUpdateStorefrontIdentifier(const std::optional<std::string>& storefront) override;
@@ -132,6 +132,9 @@ public:
 private:
     struct Recipe;
 
+    [[nodiscard]] Request _clientRequest(unsigned kind, const ClientRequest& client,
+                                         const std::optional<platform::Url>& url,
+                                         const std::vector<platform::QueryItem>& forced);
     [[nodiscard]] platform::UrlRequest build(Recipe& recipe);
     [[nodiscard]] std::string _deviceCountryCode();
     void _setUpDebuggingQueryItems();
@@ -151,7 +154,7 @@ private:
     std::shared_ptr<platform::Queue> _contextAccessQueue;
     RequestContext _context; // on _contextAccessQueue, like all below
     std::optional<platform::Location> _currentLocation;
-    std::optional<platform::Location> _area; // where the last significant move led, or the first location known
+    std::optional<platform::Location> _area; // the location after the last significant move, or the first known
     bool _locationServicesSetUp = false;
     std::set<std::string> _supportedGeoLocationSources;
     platform::NotificationCenter::Token _bagObserver;

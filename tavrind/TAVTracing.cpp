@@ -21,7 +21,7 @@ void TAVTracingSetup(const platform::UserDefaults& userDefaults)
 
 void TAVTrace(TAVTraceCode code, std::uint64_t queryId)
 {
-    if (TAVTraceEnabled.load(std::memory_order_relaxed)) platform::tracePoint(code, queryId);
+    if (code != kTraceNone && TAVTraceEnabled.load(std::memory_order_relaxed)) platform::tracePoint(code, queryId);
 }
 
 } // namespace tavrin

@@ -13,8 +13,8 @@ void replyMisused(const char* what);
 /// From now on a forgotten or repeated answer aborts the process. Tests call it first thing.
 void failOnReplyMisuse();
 
-/// The one answer to a call: a move-only callback that is called once, or given up with `abandon()` where
-/// silence is the answer. Dropping it without either is a programming fault: the caller would wait for ever.
+/// The one answer to a call: a move-only callback that is called once, or given up with `abandon()` if the call gets no
+/// answer. Dropping a reply without either is a programming error: the caller would wait for ever.
 ///
 /// Any thread, one at a time.
 template <class... Args> class Reply {
@@ -22,8 +22,8 @@ public:
     using Function = std::move_only_function<void(Args...)>;
 
     Reply() = default;
-    /// `answer` is called with the reply. `abandoned`, if given, is called instead when the reply is given up
-    /// or lost, so that whoever keeps a slot for it can free it.
+    /// `answer` is called with the reply. `abandoned`, if given, is called instead if the reply is abandoned or
+    /// dropped, so that whoever keeps a slot for it can free it.
     explicit Reply(Function answer, std::move_only_function<void()> abandoned = {})
         : _answer(std::move(answer)), _abandoned(std::move(abandoned))
     {}
@@ -51,7 +51,21 @@ public:
         std::exchange(_answer, {})(std::forward<Args>(args)...);
     }
 
-    /// Gives the answer up: the caller hears nothing.
+    /// This reply with `then` after its answer; `then` is not called if the reply is abandoned. Leaves this reply
+    /// empty.
+    [[nodiscard]] Reply andThen(std::move_only_function<void()> then) &&
+    {
+        Reply result;
+        if (!_answer) return result;
+        result._abandoned = std::exchange(_abandoned, {});
+        result._answer = [answer = std::exchange(_answer, {}), then = std::move(then)](Args... args) mutable {
+            answer(std::forward<Args>(args)...);
+            then();
+        };
+        return result;
+    }
+
+    /// Gives the answer up: the caller gets none.
     void abandon()
     {
         _answer = {};

@@ -211,6 +211,34 @@ TEST_F(QueryCacheTest, ChangesOfTheDeviceClearIt)
     EXPECT_EQ(told.size(), 1u) << "the country changed once";
 }
 
+// An answer that was asked for under the old GUID, country, locale or agent comes too late for the new one.
+TEST_F(QueryCacheTest, AnswersOfBeforeAChangeAreNotStored)
+{
+    using Change = platform::LocaleSource::Change;
+    auto connection = client();
+    const std::pair<const char*, std::function<void()>> changes[]{
+        {"none", [] {}},
+        {"locale", [&] { device.locale.handler(Change::Locale); }},
+        {"time zone", [&] { device.locale.handler(Change::TimeZone); }},
+        {"settings", [&] { device.profile.change({.storefront = "1"}); }},
+        {"country", [&] { device.profile.change({.countryCode = "CN"}); }},
+        {"GUID", [&] { assembly().guidController->reset(); }},
+        {"agent", [&] { configure(*connection, "com.quorvane.vistrel", "Vistrel/5"); }},
+    };
+    std::int64_t id = 0;
+    for (const auto& [name, change] : changes) {
+        (void)search(*connection, ++id, name);
+        const auto asked = lastTask();
+        change();
+        device.drain();
+        asked->respond(200, platform::toJson(Value::Array{Dictionary{{"query", std::string(name) + "!"}}}));
+        device.drain();
+        const bool fromMemory = search(*connection, ++id, std::string(name) + "!")->answered();
+        EXPECT_EQ(fromMemory, name == std::string_view("none")) << name;
+        lastTask()->cancel();
+    }
+}
+
 TEST_F(QueryCacheTest, ASetOutlivesTheCache)
 {
     put("w", {{"query", "weather"}});

@@ -3,6 +3,7 @@
 #include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVRequest.h"
 #include "platform/values/Json.h"
+#include "tavrind/AppWhitelistController.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/TAVNetworkRequestFactory.h"
 #include "tavrind/TavrinBagController.h"
@@ -44,9 +45,15 @@ struct RequestFactoryTest : testing::Test {
         device.location.moveTo(platform::Location{47.375, 8.545, "wifi"});
         factory->didUpdateStorefrontIdentifier("143459");
         factory->didUpdateSubscriptionDictionaries({platform::Value::dictionaryOf({{"provider", "fuse"}})});
+        device.userDefaults.set("TAVAppWhitelistSignature", "c2lnbg==");
+        assembly.appWhitelistController = std::make_shared<AppWhitelistController>(assembly);
         device.drain();
     }
 
+    [[nodiscard]] ClientRequest of(const TAVRequest& request) const
+    {
+        return {.request = request, .bag = &bag, .userGuid = guid, .userAgent = "Vistrel/4"};
+    }
     static TAVBag bagOf(std::string_view json) { return TAVBag(platform::parseJson(json).value(), "Vistrel/4"); }
 
     platform::test::TestDevice device;
@@ -92,6 +99,7 @@ TEST_F(RequestFactoryTest, EveryKindCarriesItsColumnOfTheTable)
     }
     more.moreResultsURL = card.cardURL = Url::parse("https://m.example/x");
     lookup.queryString = "The quick brown fox jumps over the lazy dog and runs away through the forest";
+    lookup.queryContext = "Der schnelle braune Fuchs springt über den faulen Hund und läuft durch den Wald davon";
     lookup.clientContext = "mail";
     lookup.hintDomain = "places";
     lookup.selectionType = LookupSelectionType::HintTap;
@@ -102,12 +110,12 @@ TEST_F(RequestFactoryTest, EveryKindCarriesItsColumnOfTheTable)
     const std::map<char, UrlRequest> requests{
         {'b', factory->bagFetchRequest(*controller, "tavrind/1", "7")},
         {'a', factory->bagCacheRequest(*controller, "tavrind/1", "7")},
-        {'s', *factory->searchRequest(*search, bag, guid)},
-        {'z', *factory->zeroKeywordRequest(zeroKeyword, bag, guid)},
-        {'m', *factory->moreResultsRequest(more, &bag, bag.userAgent(), guid)},
-        {'l', *factory->lookupRequest(lookup, bag, guid)},
-        {'c', *factory->cardRequest(card, bag, guid)},
-        {'f', *factory->flightRequest(flight, bag, guid)},
+        {'s', *factory->searchRequest(of(*search))},
+        {'z', *factory->zeroKeywordRequest(of(zeroKeyword))},
+        {'m', *factory->moreResultsRequest(of(more))},
+        {'l', *factory->lookupRequest(of(lookup))},
+        {'c', *factory->cardRequest(of(card))},
+        {'f', *factory->flightRequest(of(flight))},
         {'d', factory->fileDownloadRequest(*Url::parse("https://r.example/f"), "3", true)},
         {'u', factory->flusherUploadRequest(*Url::parse("https://u.example/up"), std::chrono::seconds(300), "abc")},
         {'w', factory->warmRequest(*Url::parse("https://s.example/warm"))},
@@ -137,6 +145,7 @@ TEST_F(RequestFactoryTest, EveryKindCarriesItsColumnOfTheTable)
         {"X-Quorvane-GeoMetadata: meta", "szlcf"},
         {"latlng=47.375000,8.545000", "szmlcf"},
         {"geosrc=wifi", "szmlcf"},
+        {"X-Quorvane-Whitelisted-App-Signature: c2lnbg==", "smlcf"},
         {"mode=managed", "szmlf"},
         {"storefront=143459", "szmlcf"},
         {"X-Quorvane-Subscriptions: [{\"provider\":\"fuse\"}]", "szmlcf"},
@@ -152,6 +161,7 @@ TEST_F(RequestFactoryTest, EveryKindCarriesItsColumnOfTheTable)
         {"ldomain=places", "l"},
         {"ltype=hint", "l"},
         {"qlang=en", "l"},
+        {"lctxlang=de", "l"},
         {"X-Quorvane-FuzzedLatLong: 47.375000,8.545000", "d"},
         {"If-None-Match: 3", "d"},
         {"X-Quorvane-Digest: abc", "u"},
@@ -169,65 +179,123 @@ TEST_F(RequestFactoryTest, EveryKindCarriesItsColumnOfTheTable)
     EXPECT_EQ(requests.at('w').cachePolicy, UrlRequest::CachePolicy::ReloadIgnoringCache);
 }
 
-TEST_F(RequestFactoryTest, TheFieldMaskHidesPlaceAndApplications)
+// The letters are those of the table above: which kinds still tell the place, and which the applications.
+TEST_F(RequestFactoryTest, TheFieldMaskHidesPlaceAndApplicationsOfThreeKinds)
 {
     knowEverything();
-    TAVSearchRequest search;
-    TAVZeroKeywordRequest zeroKeyword;
+    const TAVSearchRequest search;
+    const TAVZeroKeywordRequest zeroKeyword;
     TAVMoreResultsRequest more;
-    more.moreResultsURL = Url::parse("https://m.example/x");
     TAVCardRequest card;
-    card.cardURL = more.moreResultsURL;
-    const auto masked = kFieldMaskNoLocation;
-    for (const auto& request : {factory->searchRequest(search, bag, guid, masked),
-                                factory->zeroKeywordRequest(zeroKeyword, bag, guid, masked),
-                                factory->moreResultsRequest(more, &bag, bag.userAgent(), guid, masked)}) {
-        EXPECT_FALSE(request->url.queryValue("latlng") || request->url.queryValue("geosrc"));
-        EXPECT_FALSE(request->headers.find("X-Quorvane-Whitelisted-App-Signature"));
+    more.moreResultsURL = card.cardURL = Url::parse("https://m.example/x");
+    const TAVLookupRequest lookup;
+    const TAVFlightSearchRequest flight;
+    const auto masked = [&](const TAVRequest& request) {
+        ClientRequest client = of(request);
+        client.fieldMask = kFieldMaskNoLocation;
+        return client;
+    };
+    const std::pair<char, UrlRequest> requests[]{
+        {'s', *factory->searchRequest(masked(search))},    {'z', *factory->zeroKeywordRequest(masked(zeroKeyword))},
+        {'m', *factory->moreResultsRequest(masked(more))}, {'l', *factory->lookupRequest(masked(lookup))},
+        {'c', *factory->cardRequest(masked(card))},        {'f', *factory->flightRequest(masked(flight))},
+    };
+    std::string place, applications;
+    for (const auto& [kind, request] : requests) {
+        EXPECT_EQ(request.url.queryValue("latlng").has_value(), request.url.queryValue("geosrc").has_value()) << kind;
+        if (request.url.queryValue("latlng")) place += kind;
+        if (request.headers.find("X-Quorvane-Whitelisted-App-Signature")) applications += kind;
     }
-    EXPECT_TRUE(factory->cardRequest(card, bag, guid)->url.queryValue("latlng"));
+    EXPECT_EQ(place, "lcf");
+    EXPECT_EQ(applications, "lcf");
 }
 
 TEST_F(RequestFactoryTest, TheEndpointsOwnItemsAndTheQuerysItemsWin)
 {
-    const TAVBag own = bagOf(R"({"searchURL": "https://s.example/search?key=theirs&locale=xx"})");
+    bag = bagOf(R"({"searchURL": "https://s.example/search?key=theirs&locale=xx"})");
     TAVSearchRequest search;
     search.queryString = "typed";
     search.queryItems = {std::make_shared<TAVQueryItem>("q", "forced"), nullptr};
-    const auto request = factory->searchRequest(search, own, guid);
+    const auto request = factory->searchRequest(of(search));
     EXPECT_EQ(request->url.queryValue("key"), "theirs");
     EXPECT_EQ(request->url.queryValue("locale"), "xx");
     EXPECT_EQ(request->url.queryValue("q"), "forced");
-    EXPECT_FALSE(request->url.queryValue("qtype"));
     EXPECT_FALSE(request->timeout) << "left to the session";
     EXPECT_FALSE(request->headers.find("X-Quorvane-GeoEnvironment"));
 
-    const TAVBag timed = bagOf(R"({"searchURL": "https://s.example/", "timeoutIntervalForRequest": 7})");
-    EXPECT_EQ(factory->searchRequest(search, timed, guid)->timeout, std::chrono::seconds(7));
-    EXPECT_EQ(factory->searchRequest(search, timed, guid, 0, std::chrono::seconds(2))->timeout,
-              std::chrono::seconds(2));
+    bag = bagOf(R"({"searchURL": "https://s.example/", "timeoutIntervalForRequest": 7})");
+    ClientRequest client = of(search);
+    EXPECT_EQ(factory->searchRequest(client)->timeout, std::chrono::seconds(7));
+    client.timeout = std::chrono::seconds(2);
+    EXPECT_EQ(factory->searchRequest(client)->timeout, std::chrono::seconds(2));
 }
 
 TEST_F(RequestFactoryTest, WithoutUrlThereIsNoRequest)
 {
-    const TAVBag empty = bagOf("{}");
-    EXPECT_FALSE(factory->searchRequest(TAVSearchRequest(), empty, guid));
-    EXPECT_FALSE(factory->zeroKeywordRequest(TAVZeroKeywordRequest(), empty, guid));
-    EXPECT_FALSE(factory->lookupRequest(TAVLookupRequest(), empty, guid));
-    EXPECT_FALSE(factory->flightRequest(TAVFlightSearchRequest(), empty, guid));
-    EXPECT_FALSE(factory->cardRequest(TAVCardRequest(), empty, guid));
-    EXPECT_FALSE(factory->moreResultsRequest(TAVMoreResultsRequest(), nullptr, {}, guid));
+    bag = bagOf("{}");
+    EXPECT_FALSE(factory->searchRequest(of(TAVSearchRequest())));
+    EXPECT_FALSE(factory->zeroKeywordRequest(of(TAVZeroKeywordRequest())));
+    EXPECT_FALSE(factory->lookupRequest(of(TAVLookupRequest())));
+    EXPECT_FALSE(factory->flightRequest(of(TAVFlightSearchRequest())));
+    EXPECT_FALSE(factory->cardRequest(of(TAVCardRequest())));
+    EXPECT_FALSE(factory->moreResultsRequest(of(TAVMoreResultsRequest())));
 }
 
-TEST_F(RequestFactoryTest, ALookupInNoLanguageSaysNone)
+TEST_F(RequestFactoryTest, TheTriggerSaysWhetherTheQueryIsASuggestion)
 {
-    TAVLookupRequest lookup;
-    lookup.queryString = "42";
-    lookup.selectionType = LookupSelectionType::Explicit;
-    const auto request = factory->lookupRequest(lookup, bag, guid);
-    EXPECT_FALSE(request->url.queryValue("qlang") || request->url.queryValue("lctxlang"));
-    EXPECT_EQ(request->url.queryValue("ltype"), "explicit");
-    EXPECT_TRUE(request->url.string().contains("&context&")) << request->url.string();
+    TAVSearchRequest search;
+    std::set<int> suggested;
+    for (int trigger = 0; trigger <= static_cast<int>(StartSearchTrigger::Warm); ++trigger) {
+        search.triggerEvent = static_cast<StartSearchTrigger>(trigger);
+        if (factory->searchRequest(of(search))->url.queryValue("qtype") == "suggested") suggested.insert(trigger);
+    }
+    EXPECT_EQ(suggested, (std::set{8, 10}));
+}
+
+TEST_F(RequestFactoryTest, ALookupSaysWhatIsKnownOfIt)
+{
+    using Type = LookupSelectionType;
+    const char* english = "The quick brown fox jumps over the lazy dog and runs away through the forest";
+    const struct {
+        const char* words;
+        std::optional<std::string> context;
+        Type selection;
+        std::optional<std::string> qlang, lctxlang;
+        const char* ltype;
+    } cases[]{
+        {"42", std::nullopt, Type::Explicit, std::nullopt, std::nullopt, "explicit"},
+        {"42", "17", Type::Default, std::nullopt, std::nullopt, "default"},
+        {"42", english, Type::HintTap, std::nullopt, "en", "hint"},
+        {english, "", static_cast<Type>(7), "en", std::nullopt, "default"},
+    };
+    for (const auto& c : cases) {
+        TAVLookupRequest lookup;
+        lookup.queryString = c.words;
+        lookup.queryContext = c.context;
+        lookup.selectionType = c.selection;
+        const Url url = factory->lookupRequest(of(lookup))->url;
+        EXPECT_EQ(url.queryValue("qlang"), c.qlang) << url.string();
+        EXPECT_EQ(url.queryValue("lctxlang"), c.lctxlang) << url.string();
+        EXPECT_EQ(url.queryValue("ltype"), c.ltype) << url.string();
+        EXPECT_FALSE(url.queryValue("ldomain"));
+        EXPECT_TRUE(url.string().contains("&context&")) << url.string();
+    }
+}
+
+TEST_F(RequestFactoryTest, WhatTheDeviceDoesNotHaveIsLeftOut)
+{
+    device.locale.context = {.identifier = "de_CH",
+                             .systemLanguage = "",
+                             .preferredLanguages = {},
+                             .calendar = "",
+                             .is24Hour = false,
+                             .measurementSystem = "",
+                             .region = ""};
+    device.profile.current = {};
+    factory = TAVNetworkRequestFactory::make(assembly);
+    device.drain();
+    EXPECT_EQ(contents(*factory->searchRequest({.request = TAVSearchRequest(), .bag = &bag})),
+              (std::set<std::string>{"card=1", "key=walrus7351", "locale=de_CH", "q=", "time_zone=Europe/Zurich"}));
 }
 
 TEST_F(RequestFactoryTest, OnlyAllowedSourcesTellThePlace)
@@ -241,14 +309,36 @@ TEST_F(RequestFactoryTest, OnlyAllowedSourcesTellThePlace)
     device.drain();
     EXPECT_TRUE(factory->context().geoLocationLatLng.empty());
 
-    TAVMoreResultsRequest more;
-    more.moreResultsURL = Url::parse("https://m.example/x?latlng=1,2");
-    const int before = device.location.updatesRequested;
-    const auto withoutBag = factory->moreResultsRequest(more, nullptr, "agent/1", guid);
+    TAVMoreResultsRequest more, placed;
+    more.moreResultsURL = Url::parse("https://m.example/x");
+    placed.moreResultsURL = Url::parse("https://m.example/x?latlng=1,2"); // says where the search was made
+    TAVCardRequest card;
+    card.cardURL = more.moreResultsURL;
+    const auto updates = [&](const auto& ask) {
+        const int before = device.location.updatesRequested;
+        (void)ask();
+        return device.location.updatesRequested - before;
+    };
+    EXPECT_EQ(updates([&] { return factory->searchRequest(of(TAVSearchRequest())); }), 1);
+    EXPECT_EQ(updates([&] { return factory->zeroKeywordRequest(of(TAVZeroKeywordRequest())); }), 1);
+    EXPECT_EQ(updates([&] { return factory->lookupRequest(of(TAVLookupRequest())); }), 1);
+    EXPECT_EQ(updates([&] { return factory->flightRequest(of(TAVFlightSearchRequest())); }), 1);
+    EXPECT_EQ(updates([&] { return factory->moreResultsRequest(of(more)); }), 1);
+    EXPECT_EQ(updates([&] { return factory->moreResultsRequest(of(placed)); }), 0);
+    EXPECT_EQ(updates([&] { return factory->cardRequest(of(card)); }), 0);
+    const auto withoutBag = factory->moreResultsRequest({.request = more, .userAgent = "agent/1"});
     EXPECT_EQ(*withoutBag->headers.find("User-Agent"), "agent/1");
-    EXPECT_EQ(device.location.updatesRequested, before) << "its URL says where the search was made";
-    (void)factory->searchRequest(TAVSearchRequest(), bag, guid);
-    EXPECT_EQ(device.location.updatesRequested, before + 1);
+}
+
+TEST_F(RequestFactoryTest, TheDevicesCountrySaysWhereTheBagIs)
+{
+    const TavrinBagController controller(assembly);
+    const auto host = [&] { return factory->bagFetchRequest(controller, "tavrind/1", "").url.host(); };
+    EXPECT_EQ(host(), "bag.quorvane.example");
+    device.profile.change({.countryCode = "CN"});
+    device.drain();
+    EXPECT_EQ(host(), "bag-cn.quorvane.example");
+    EXPECT_EQ(factory->bagCacheRequest(controller, "tavrind/1", "").url.host(), "bag-cn.quorvane.example");
 }
 
 TEST_F(RequestFactoryTest, ChangesThatConcernTheBagAreTold)

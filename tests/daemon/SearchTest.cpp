@@ -1,7 +1,9 @@
 #include "CoreTavrin/TAVFeedback.h"
+#include "platform/base/Trace.h"
 #include "platform/values/Dictionary.h"
 #include "searchrecords/ZRErrorFeedback.h"
 #include "searchrecords/ZRNetworkFeedback.h"
+#include "tavrind/TAVTracing.h"
 #include "tests/support/DaemonFixture.h"
 
 namespace tavrin::test {
@@ -40,6 +42,7 @@ TEST_F(SearchTest, TravelsToTheServiceAndBack)
     ASSERT_TRUE(end);
     EXPECT_EQ(end->tavrinStatus, "OK");
     EXPECT_EQ(end->fbq, "f1");
+    EXPECT_EQ(end->partialClientIp, "10.0.x");
     EXPECT_EQ(end->tavrinDuration, 12.5);
     EXPECT_EQ(end->statusCode, 200);
     EXPECT_EQ(end->responseSize, static_cast<std::int64_t>(std::string_view(kAnswer).size()));
@@ -91,12 +94,6 @@ TEST_F(SearchTest, SkipsWhatNeedsNoSearch)
     EXPECT_TRUE(search(*connection, 4, "日本")->pending()) << "as long as the minimum";
     EXPECT_TRUE(search(*connection, 5, "😀")->pending()) << "two UTF-16 units";
     EXPECT_EQ(tasks().size(), before + 2);
-
-    auto news = client("com.quorvane.news", "news/1", 80);
-    EXPECT_TRUE(isEmptyAnswer(*search(*news, 1, "weather")));
-    EXPECT_EQ(session->last<TAVSkipSearchFeedback>()->triggerEvent, SkipSearchTrigger::BagDisabled);
-    EXPECT_EQ(counter("news.keystrokes"), 1) << "every search counts, sent or not";
-    EXPECT_EQ(counter("search"), 2);
 }
 
 // What the service may answer, and what the client and the session then get.
@@ -144,14 +141,11 @@ TEST_F(SearchTest, EveryAnswerOfTheServiceIsAnswered)
 TEST_F(SearchTest, TransportErrorsReachTheClientAndTheSession)
 {
     auto connection = client();
-    auto call = search(*connection, 1, "weat", {{"clientQueryId", 9}});
-    session->takeClasses();
+    auto call = search(*connection, 1, "weat");
     lastTask()->fail(platform::Error::withReason("UrlErrorDomain", -1004, "refused"));
     device.drain();
     EXPECT_EQ(call->argument(1).count(), 0u);
     EXPECT_EQ(reasonOf(*call), "refused");
-    EXPECT_EQ(session->records.at(1)->clientQueryId, 9u);
-    EXPECT_EQ(session->takeClasses(), (Classes{"ZRErrorFeedback", "ZREndNetworkSearchFeedback"}));
     EXPECT_EQ(counter("Vistrel/4.noconnection"), 1);
     EXPECT_EQ(counter("Vistrel/4.fedapicall.serverstatus.0"), 0);
 
@@ -244,70 +238,228 @@ TEST_F(SearchTest, TheBagsArrivalWakesEveryWaiterOfAClient)
     EXPECT_EQ(tasks().size(), 3u) << "the bag and both searches";
 }
 
-TEST_F(SearchTest, OtherKindsTakeTheirOwnRoad)
-{
-    auto connection = client();
-    struct Kind {
-        const char* className;
-        Dictionary fields;
-        const char* urlStart;
-        const char* log;
-    };
-    const Kind kinds[]{
-        {"TAVZeroKeywordRequest", {}, "https://s.example/search?", "Got network response for zkw query"},
-        {"TAVMoreResultsRequest",
-         {{"moreResultsURL", "https://m.example/more?q=weat"}},
-         "https://m.example/more?",
-         "Got network response for more results query"},
-        {"TAVCardRequest",
-         {{"cardURL", "https://c.example/card"}},
-         "https://c.example/card?",
-         "Got network response for card query"},
-        {"TAVLookupRequest",
-         {{"queryString", "tree"}},
-         "https://s.example/search?",
-         "Got network response for lookup query"},
-        {"TAVFlightSearchRequest",
-         {{"queryString", "AB1"}},
-         "https://s.example/flight?",
-         "Got network response for flight query"},
-        {"TAVFlightLookupRequest",
-         {{"queryString", "AB1"}},
-         "https://s.example/flight?",
-         "Got network response for flight query"},
-    };
-    for (const Kind& kind : kinds) {
-        platform::test::LogCapture log;
-        auto call = request(*connection, kind.className, 1, kind.fields);
-        EXPECT_TRUE(lastTask()->originalRequest().url.string().starts_with(kind.urlStart)) << kind.className;
-        respond(kAnswer);
-        EXPECT_GT(call->argument(1).count(), 0u) << kind.className;
-        EXPECT_EQ(log.count(kind.log), 1) << kind.className;
+// ---- What the kinds of request have of their own
+
+struct Kind {
+    const char* className;
+    Dictionary fields;
+    const char* url;  // where it is sent
+    const char* name; // in the log
+    int endpoint = 6; // of its start record, like the next two
+    const char* input = "";
+    const char* startClass = "ZRStartNetworkSearchFeedback";
+    std::vector<std::uint32_t> trace = {};
+    std::size_t attempts = 1;  // that a service that never answers sees
+    bool needsBag = true;      // else it is performed without one, or with a disabled one
+    Classes whenDisabled = {}; // the records that a disabled bag leaves
+};
+
+const Kind kKinds[]{
+    {.className = "TAVSearchRequest",
+     .fields = {{"queryString", "weat"}},
+     .url = "https://s.example/search?",
+     .name = "(id, query): (7, weat)",
+     .input = "weat",
+     .trace = {0x2b000004, 0x2b000008},
+     .whenDisabled = {"TAVSkipSearchFeedback"}},
+    {.className = "TAVZeroKeywordRequest",
+     .url = "https://s.example/search?",
+     .name = "zkw query",
+     .trace = {0x2b00001c, 0x2b000020}},
+    {.className = "TAVMoreResultsRequest",
+     .fields = {{"moreResultsURL", "https://m.example/more?p=2&q=weat"}, {"queryString", "other"}},
+     .url = "https://m.example/more?",
+     .name = "more results query",
+     .input = "weat",
+     .needsBag = false},
+    {.className = "TAVCardRequest",
+     .fields = {{"cardURL", "https://c.example/card"}, {"queryString", "weat"}},
+     .url = "https://c.example/card?",
+     .name = "card query",
+     .endpoint = 11,
+     .input = "weat",
+     .trace = {0x2b00000c, 0x2b000010}},
+    {.className = "TAVLookupRequest",
+     .fields = {{"queryString", "tree"}, {"selectionType", 2}},
+     .url = "https://s.example/search?",
+     .name = "lookup query",
+     .input = "tree",
+     .startClass = "TAVLookupStartNetworkSearchFeedback",
+     .trace = {0x2b00002c, 0x2b000030},
+     .attempts = 4,
+     .whenDisabled = {"TAVSkipSearchFeedback"}},
+    {.className = "TAVFlightSearchRequest",
+     .fields = {{"queryString", "AB1"}},
+     .url = "https://s.example/flight?",
+     .name = "flight query",
+     .input = "AB1"},
+    {.className = "TAVFlightLookupRequest",
+     .fields = {{"queryString", "AB1"}},
+     .url = "https://s.example/flight?",
+     .name = "flight query",
+     .input = "AB1"},
+};
+
+/// What was traced, taken out.
+std::vector<std::uint32_t> tracePoints;
+
+struct KindsTest : SearchTest {
+    KindsTest() { TAVTraceEnabled = true; }
+    ~KindsTest() override { TAVTraceEnabled = false; }
+
+    std::shared_ptr<FakeCall> ask(FakeConnection& connection, const Kind& kind)
+    {
+        SCOPED_TRACE(kind.className);
+        session->records.clear();
+        tracePoints.clear();
+        Dictionary fields = kind.fields;
+        fields.set("clientQueryId", 9);
+        fields.set("triggerEvent", 4);
+        return request(connection, kind.className, 7, std::move(fields));
     }
-    EXPECT_EQ(counter("search"), 0);
-    EXPECT_EQ(counter("vistrel.keystrokes"), 0);
-    EXPECT_TRUE(request(*connection, "TAVRequest", 1)->abandoned()) << "of no kind";
-    EXPECT_TRUE(request(*connection, "ZRClearInputFeedback", 1)->abandoned());
-    EXPECT_TRUE(request(*connection, "Unheard", 1)->abandoned());
+};
+
+TEST_F(KindsTest, EachTakesItsRoad)
+{
+    for (const Kind& kind : kKinds) {
+        SCOPED_TRACE(kind.className);
+        auto connection = client();
+        device.advance(31s); // the connection is no longer warm
+        platform::test::LogCapture log;
+        auto call = ask(*connection, kind);
+        EXPECT_TRUE(lastTask()->originalRequest().url.string().starts_with(kind.url));
+        const auto start = session->last<ZRStartNetworkSearchFeedback>();
+        ASSERT_TRUE(start);
+        EXPECT_EQ(start->className(), kind.startClass);
+        EXPECT_EQ(start->input, kind.input);
+        EXPECT_EQ(static_cast<int>(start->endpoint), kind.endpoint);
+        EXPECT_EQ(static_cast<int>(start->triggerEvent), 4);
+        const auto lookup = session->last<TAVLookupStartNetworkSearchFeedback>();
+        EXPECT_EQ(lookup ? lookup->selectionType : LookupSelectionType::HintTap, LookupSelectionType::HintTap);
+        EXPECT_EQ(session->records.back()->clientQueryId, 9u);
+        EXPECT_EQ(session->records.back()->userAgent, "Vistrel/4");
+
+        const std::size_t sent = tasks().size();
+        connection->call("ReportEvent",
+                         {"event", 1, Dictionary{{"class", "ZRSearchViewAppearFeedback"}, {"viewAppearEvent", 2}}});
+        device.drain();
+        EXPECT_EQ(tasks().size(), sent) << "any request keeps the connection warm";
+
+        const std::size_t half = kind.trace.size() / 2;
+        EXPECT_EQ(tracePoints, std::vector(kind.trace.begin(), kind.trace.begin() + static_cast<int>(half)));
+        respond(kAnswer);
+        EXPECT_EQ(tracePoints, kind.trace);
+        EXPECT_GT(call->argument(1).count(), 0u);
+        EXPECT_EQ(log.count(std::string("Got network response for ") + kind.name), 1);
+        EXPECT_EQ(session->takeClasses().back(), "TAVEndNetworkSearchFeedback");
+    }
+    EXPECT_EQ(counter("search"), 1);
+    EXPECT_EQ(counter("vistrel.keystrokes"), 1);
+
+    auto connection = client();
+    tracePoints.clear();
+    connection->call("Feedback", {""});
+    device.drain();
+    EXPECT_EQ(tracePoints, (std::vector<std::uint32_t>{0x2b000024, 0x2b000028}));
+    for (const char* unserved : {"TAVRequest", "ZRClearInputFeedback", "Unheard"})
+        EXPECT_TRUE(request(*connection, unserved, 1)->abandoned()) << unserved;
 }
 
-TEST_F(SearchTest, LookupsAreRepeatedOthersAreNot)
+TEST_F(KindsTest, EachFailsWithItsQuery)
+{
+    for (const Kind& kind : kKinds) {
+        SCOPED_TRACE(kind.className);
+        auto connection = client();
+        const std::size_t before = tasks().size();
+        auto call = ask(*connection, kind);
+        for (std::size_t i = 0; i < kind.attempts; ++i) {
+            EXPECT_TRUE(call->pending());
+            lastTask()->fail(platform::Error::withReason("UrlErrorDomain", -1004, "refused"));
+            device.advance(0s);
+        }
+        EXPECT_EQ(tasks().size(), before + kind.attempts);
+        EXPECT_EQ(reasonOf(*call), "refused");
+        ASSERT_EQ(session->records.size(), 3u);
+        for (const auto& record : session->records) EXPECT_EQ(record->clientQueryId, 9u);
+        EXPECT_EQ(session->takeClasses(), (Classes{kind.startClass, "ZRErrorFeedback", "ZREndNetworkSearchFeedback"}));
+    }
+}
+
+TEST_F(KindsTest, ALookupIsNotRepeatedAfterItsDeadline)
 {
     auto connection = client();
-    auto lookup = request(*connection, "TAVLookupRequest", 1, {{"queryString", "tree"}});
-    const std::size_t before = tasks().size();
-    for (int i = 0; i < 4; ++i) {
+    for (const platform::Duration late : {platform::Duration(60s), platform::Duration(60s + 1ns)}) {
+        auto call = ask(*connection, kKinds[4]);
+        device.advance(late);
         lastTask()->fail(platform::Error("X", 1));
         device.advance(0s);
+        EXPECT_EQ(call->pending(), late == 60s);
+        while (device.loader.cancelAll()) device.advance(0s); // its repetitions, too
     }
-    EXPECT_EQ(tasks().size(), before + 3);
-    EXPECT_TRUE(lookup->answered());
-    auto card = request(*connection, "TAVCardRequest", 2, {{"cardURL", "https://c.example/card"}});
-    lastTask()->fail(platform::Error("X", 1));
-    device.advance(0s);
-    EXPECT_TRUE(card->answered());
-    EXPECT_EQ(tasks().size(), before + 4);
+}
+
+TEST_F(KindsTest, ADisabledBagSkipsThem)
+{
+    auto news = client("com.quorvane.news", "news/1", 80);
+    const std::size_t before = tasks().size();
+    for (const Kind& kind : kKinds) {
+        SCOPED_TRACE(kind.className);
+        auto call = ask(*news, kind);
+        if (!kind.needsBag) {
+            EXPECT_TRUE(call->pending());
+            lastTask()->cancel();
+            device.drain();
+            continue;
+        }
+        EXPECT_TRUE(isEmptyAnswer(*call));
+        if (const auto skip = session->last<TAVSkipSearchFeedback>()) {
+            EXPECT_EQ(skip->triggerEvent, SkipSearchTrigger::BagDisabled);
+            EXPECT_EQ(skip->input, kind.input);
+        }
+        EXPECT_EQ(session->takeClasses(), kind.whenDisabled);
+    }
+    EXPECT_EQ(tasks().size(), before + 1);
+    EXPECT_EQ(counter("search"), 0);
+    EXPECT_EQ(counter("news.keystrokes"), 1) << "every search counts, sent or not";
+}
+
+// A fetch that fails ends the wait for the first bag at once.
+TEST_F(KindsTest, AFailedBagFailsThem)
+{
+    startWithoutBag();
+    int failures = 0;
+    const auto token = device.notifications.observe("TAVBagChangeNotification", [&](const auto& notification) {
+        EXPECT_EQ(notification.template get<platform::Error>("bagError").code, 2);
+        ++failures;
+    });
+    auto connection = client();
+    respond("", 500);
+    EXPECT_EQ(connection->takePushes().size(), 1u) << "the error, and nothing that waits for its second";
+    for (const Kind& kind : kKinds) {
+        SCOPED_TRACE(kind.className);
+        auto call = ask(*connection, kind);
+        EXPECT_TRUE(call->pending());
+        if (!kind.needsBag) {
+            EXPECT_TRUE(lastTask()->originalRequest().url.string().starts_with(kind.url));
+            lastTask()->cancel();
+            continue;
+        }
+        EXPECT_EQ(lastTask()->originalRequest().url.path(), "/bag") << "each tries once more";
+        respond("", 500);
+        EXPECT_EQ(reasonOf(*call), "timeout");
+        const auto skip = session->last<TAVSkipSearchFeedback>();
+        ASSERT_TRUE(skip);
+        EXPECT_EQ(skip->triggerEvent, SkipSearchTrigger::BagFetchFailed);
+        EXPECT_EQ(session->records.back()->clientQueryId, 9u);
+    }
+    EXPECT_EQ(failures, 7);
 }
 
 } // namespace
 } // namespace tavrin::test
+
+/// Stands in for the probe of the library, which no test could see.
+void platform::tracePoint(std::uint32_t code, std::uint64_t)
+{
+    tavrin::test::tracePoints.push_back(code);
+}

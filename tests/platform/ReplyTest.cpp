@@ -48,6 +48,17 @@ TEST_F(ReplyTest, AnAbandonedOneIsSilentAndFreesItsSlotOnce)
     EXPECT_FALSE(none);
 }
 
+TEST_F(ReplyTest, WhatFollowsRunsAfterTheAnswerAlone)
+{
+    const auto followed = [this] { return make().andThen([this] { answers += "then;"; }); };
+    followed().andThen([this] { answers += "last;"; })(1, "a");
+    EXPECT_EQ(answers, "1a;then;last;");
+    answers.clear();
+    followed().abandon();
+    EXPECT_EQ(answers, "abandoned;");
+    EXPECT_FALSE(Reply<>().andThen([] { FAIL(); }));
+}
+
 TEST_F(ReplyTest, ItsOwnerMayGoWhileItAnswers)
 {
     struct Owner {

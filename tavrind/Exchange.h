@@ -1,0 +1,77 @@
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "CoreTavrin/TAVProtocols.h"
+#include "platform/net/UrlSession.h"
+#include "searchrecords/ZREnums.h"
+#include "tavrind/ClientState.h"
+
+namespace platform {
+class JsonDocument;
+} // namespace platform
+
+namespace tavrin {
+
+struct CachedResultSet;
+struct RequestKind;
+struct ZRStartNetworkSearchFeedback;
+
+/// One request of a client, from its arrival to its reply and its feedback:
+///
+///     begin ──► first bag ──► skip rules ──► query cache ──► sent ──► completed
+///                   │             │               │                       │
+///                   └─────────────┴───────┬───────┴───────────────────────┘
+///                                         ▼
+///                                       reply ──► feedback
+///
+/// Every kind of request takes these steps; what differs is in its `RequestKind`. The reply is called exactly once.
+/// Whoever performs the next step holds the exchange: the queue that waits for the bag, then the loader's task. Steps
+/// that write members never overlap with others, so members need no lock.
+class Exchange : public std::enable_shared_from_this<Exchange> {
+public:
+    Exchange(Assembly& assembly, std::shared_ptr<ClientState> client, const RequestKind& kind,
+             std::shared_ptr<TAVRequest> request, RequestReply reply);
+    ~Exchange();
+
+    /// Call once, from a task of a serial queue: the queue is held back while the request waits for the first bag.
+    void begin();
+
+private:
+    void _perform(bool hasBag);
+    [[nodiscard]] bool _isSkipped();
+    [[nodiscard]] bool _answerFromCache();
+    void _send();
+    void _completed(std::optional<platform::Bytes> data, std::optional<platform::UrlResponse> response,
+                    std::optional<platform::Error> error, const platform::Value& timingData);
+    void _answer(std::shared_ptr<TAVReply> record, OptionalError error);
+    [[nodiscard]] bool _mayCache(const platform::JsonDocument& answer) const;
+    [[nodiscard]] std::vector<std::shared_ptr<const CachedResultSet>> _useAnswer(const platform::JsonDocument& document,
+                                                                                 bool cached);
+    void _forceFetch(const platform::UrlResponse& response);
+
+    void _addFeedback(std::shared_ptr<ZRFeedback> record, std::uint64_t clientQueryId);
+    void _skipSearch(SkipSearchTrigger reason, std::optional<std::string> uuid = {});
+    void recordSearchResult(int statusCode);
+    void failSearchFeedback(const std::optional<platform::Error>& error, std::size_t responseSize, int statusCode,
+                            const platform::Value& timingData);
+    void endNetworkFeedback(const platform::JsonDocument* rawResponse, std::size_t responseSize, int statusCode,
+                            const platform::Value& timingData);
+
+    Assembly& _assembly;
+    const std::shared_ptr<ClientState> _client;
+    const RequestKind& _kind;
+    const std::shared_ptr<TAVRequest> _request;
+    RequestReply _reply;
+
+    ClientView _view;                   // the client as it was after the wait for the bag
+    std::uint64_t _cacheGeneration = 0; // of the query cache, before the request was built
+    platform::UrlRequest _httpRequest;  // as sent
+    std::shared_ptr<ZRStartNetworkSearchFeedback> _start;
+};
+
+} // namespace tavrin
