@@ -11,6 +11,7 @@
 #include "platform/values/ValueCoder.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/ClientState.h"
+#include "tavrind/ImageLoader.h"
 #include "tavrind/RequestKind.h"
 #include "tavrind/TavrinLogging.h"
 
@@ -39,8 +40,7 @@ std::shared_ptr<ClientStateManager> ClientStateManager::make(Assembly& assembly)
 ClientStateManager::ClientStateManager(Assembly& assembly)
     : _assembly(assembly), _persistSessions(assembly.userDefaults.boolean("TAVPersistSessions")),
       stateCacheQueue(assembly.device.serialQueue("com.quorvane.tavrind.stateCache")),
-      _imageHostsQueue(assembly.device.concurrentQueue("com.quorvane.tavrind.imageHostsQueue")),
-      _imageQueue(assembly.device.serialQueue("com.quorvane.tavrind.images")),
+      _imageLoader(std::make_shared<ImageLoader>(assembly)),
       _listener(assembly.device.ipc.anonymous(endpointInterface(), "com.quorvane.tavrind.endpoint"))
 {}
 
@@ -115,7 +115,7 @@ void ClientStateManager::_accept(std::shared_ptr<platform::ipc::Connection> conn
     const platform::Log& log = TavrinLogForCategory(kLogConnection);
     log.debug("new endpoint connection");
     connection->exportObject(endpointHandler(weak_from_this()));
-    // The handler keeps the connection until it ends.
+    // The handler owns the connection until its end.
     connection->setInvalidationHandler([connection, &log] { log.debug("endpoint connection invalidated"); });
     connection->resume();
 }
@@ -132,6 +132,21 @@ void ClientStateManager::request(std::shared_ptr<TAVRequest> request,
     const RequestKind* kind = kindOf(*request);
     if (!kind || !kind->servedOnEndpoint) return reply.abandon();
     state->perform(*kind, std::move(request), std::move(reply));
+}
+
+void ClientStateManager::loadImages(Value::Array images, std::uint64_t timeout, platform::Reply<Value> reply)
+{
+    _imageLoader->loadImages(std::move(images), timeout, std::move(reply));
+}
+
+void ClientStateManager::processImagesFromResponse(const Value& response, const std::shared_ptr<const TAVBag>& bag)
+{
+    _imageLoader->processImagesFromResponse(response, bag);
+}
+
+std::set<std::string> ClientStateManager::validImageHosts() const
+{
+    return _imageLoader->validImageHosts();
 }
 
 } // namespace tavrin

@@ -1,4 +1,4 @@
-// The images of answers: fetched ahead into the HTTP cache, and handed to clients.
+#include "tavrind/ImageLoader.h"
 
 #include <algorithm>
 
@@ -16,7 +16,6 @@
 #include "searchrecords/ZRNetworkFeedback.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/ClientSessionManager.h"
-#include "tavrind/ClientStateManager.h"
 #include "tavrind/FeedbackRecords.h"
 #include "tavrind/mmap_file.h"
 #include "tavrind/TavrinBagController.h"
@@ -35,13 +34,13 @@ namespace {
 
 using namespace std::chrono_literals;
 
-/// How long a client may wait.
+/// Limit of a client's wait, whatever it asks for.
 constexpr platform::Duration kLongestLoad = 60s;
-/// How long a fetch may take that never stops receiving.
+/// Limit of a fetch in all: the time-out of a request only limits the time without data.
 constexpr platform::Duration kLongestFetch = 5min;
-/// Bytes: as much as the HTTP cache keeps of one answer.
+/// Bytes: the largest response that the HTTP cache stores.
 constexpr std::size_t kMaximumImage = 10u << 20;
-/// Bytes: half of what an array of a D-Bus message may have.
+/// Bytes: half of the limit of an array in a D-Bus message.
 constexpr std::size_t kMaximumAnswer = 32u << 20;
 constexpr std::size_t kMaximumHosts = 1000;
 
@@ -50,7 +49,7 @@ const platform::Log& log()
     return TavrinLogForCategory(kLogImages);
 }
 
-/// All URLs, in the order in which they are fetched.
+/// All URLs in the order of fetching.
 std::vector<Url> inOrder(OrderedImages images)
 {
     std::vector<Url> urls = std::move(images.primary);
@@ -60,22 +59,27 @@ std::vector<Url> inOrder(OrderedImages images)
 
 } // namespace
 
-/// One fetch that is under way.
-struct ClientStateManager::ImageLoad {
+/// One fetch under way, owned by its task's completion.
+struct ImageLoader::Load {
     Url url;
     platform::Transactions::Token transaction;
     std::shared_ptr<ZRStartNetworkSearchFeedback> start;
     platform::Result<platform::FileHandle> file;
     platform::Clock::TimerId limit = 0;
-    std::weak_ptr<platform::UrlTask> task; // which owns this
+    std::weak_ptr<platform::UrlTask> task; // owns this
 };
 
-std::set<std::string> ClientStateManager::validImageHosts() const
+ImageLoader::ImageLoader(Assembly& assembly)
+    : _assembly(assembly), _imageHostsQueue(assembly.device.concurrentQueue("com.quorvane.tavrind.imageHostsQueue")),
+      _imageQueue(assembly.device.serialQueue("com.quorvane.tavrind.images"))
+{}
+
+std::set<std::string> ImageLoader::validImageHosts() const
 {
     return _imageHostsQueue->sync([this] { return _validImageHosts; });
 }
 
-void ClientStateManager::_addImageHosts(const std::set<std::string>& hosts)
+void ImageLoader::_addImageHosts(const std::set<std::string>& hosts)
 {
     for (const std::string& host : hosts) {
         if (_validImageHosts.size() == kMaximumHosts) return;
@@ -83,7 +87,7 @@ void ClientStateManager::_addImageHosts(const std::set<std::string>& hosts)
     }
 }
 
-void ClientStateManager::processImagesFromResponse(const Value& response, const std::shared_ptr<const TAVBag>& bag)
+void ImageLoader::processImagesFromResponse(const Value& response, const std::shared_ptr<const TAVBag>& bag)
 {
     if (!bag) return;
     _imageQueue->async([weak = weak_from_this(), response, bag] {
@@ -95,13 +99,13 @@ void ClientStateManager::processImagesFromResponse(const Value& response, const 
                                   [&](const Value& image) { collectOrderedImages(*bag, image, &seen, images); });
         if (images.hosts.empty()) return;
         self->_imageHostsQueue->barrierAsync([weak, hosts = std::move(images.hosts)] {
-            if (const auto manager = weak.lock()) manager->_addImageHosts(hosts);
+            if (const auto loader = weak.lock()) loader->_addImageHosts(hosts);
         });
         self->_fetchImages(inOrder(std::move(images)), *bag, nullptr);
     });
 }
 
-void ClientStateManager::loadImages(Value::Array images, std::uint64_t timeout, platform::Reply<Value> reply)
+void ImageLoader::loadImages(Value::Array images, std::uint64_t timeout, platform::Reply<Value> reply)
 {
     const auto bag = _assembly.bagController->currentBag();
     if (!bag) return reply(Dictionary());
@@ -125,14 +129,14 @@ void ClientStateManager::loadImages(Value::Array images, std::uint64_t timeout, 
         });
 }
 
-platform::Bytes ClientStateManager::_cachedImage(const std::optional<Url>& url) const
+platform::Bytes ImageLoader::_cachedImage(const std::optional<Url>& url) const
 {
     const auto cache = _assembly.urlSession->cache();
     const auto kept = url && cache ? cache->find(*url) : std::nullopt;
     return kept ? kept->body : platform::Bytes();
 }
 
-Value ClientStateManager::_cachedImages(const Value::Array& images, const TAVBag& bag) const
+Value ImageLoader::_cachedImages(const Value::Array& images, const TAVBag& bag) const
 {
     Dictionary loaded;
     std::size_t size = 0;
@@ -159,19 +163,19 @@ Value ClientStateManager::_cachedImages(const Value::Array& images, const TAVBag
     return loaded;
 }
 
-void ClientStateManager::_fetchImages(const std::vector<Url>& urls, const TAVBag& bag, const ImageGroup& group)
+void ImageLoader::_fetchImages(const std::vector<Url>& urls, const TAVBag& bag, const ImageGroup& group)
 {
     const auto seconds = bag.timeoutIntervalForRequest();
     const auto timeout = seconds ? std::optional(requestTimeout(*seconds)) : std::nullopt;
     for (const Url& url : urls) _fetchImageURL(url, timeout, group);
 }
 
-void ClientStateManager::_fetchImageURL(const Url& url, std::optional<platform::Duration> timeoutInterval,
-                                        const ImageGroup& group)
+void ImageLoader::_fetchImageURL(const Url& url, std::optional<platform::Duration> timeoutInterval,
+                                 const ImageGroup& group)
 {
     _imageQueue->assertOnQueue();
     if (!url.scheme().starts_with("http")) return log().fault("invalid url scheme: {}", url.string());
-    if (_imageFetches.join(url, group)) return;
+    if (_imageFetches.join(url, group)) return _startImageFetches(); // it may have changed lanes
     const auto cache = _assembly.urlSession->cache();
     if (cache && cache->find(url)) return log().log("found {} in cache", url.string());
     if (!_imageFetches.add({url, timeoutInterval}, group))
@@ -179,23 +183,23 @@ void ClientStateManager::_fetchImageURL(const Url& url, std::optional<platform::
     _startImageFetches();
 }
 
-void ClientStateManager::_startImageFetches()
+void ImageLoader::_startImageFetches()
 {
     while (const auto fetch = _imageFetches.next()) _startImageFetch(*fetch);
 }
 
-void ClientStateManager::_startImageFetch(const ImageFetch& fetch)
+void ImageLoader::_startImageFetch(const ImageFetch& fetch)
 {
     log().log("fetching image {}", fetch.url.string());
     platform::Device& device = _assembly.device;
     platform::UrlRequest request{
         .url = fetch.url, .timeout = fetch.timeoutInterval, .maximumResponseSize = kMaximumImage};
-    const auto load = std::make_shared<ImageLoad>(ImageLoad{
-        .url = fetch.url,
-        .transaction = device.transactions.begin("imageFetch"),
-        .start = startNetworkSearchFeedback("", request, StartSearchTrigger::ImageLoad, EndpointType::TavrinImage),
-        .file = device.files.createTemporary(),
-        .task = {}});
+    const auto load = std::make_shared<Load>(
+        Load{.url = fetch.url,
+             .transaction = device.transactions.begin("imageFetch"),
+             .start = startNetworkSearchFeedback("", request, StartSearchTrigger::ImageLoad, EndpointType::TavrinImage),
+             .file = device.files.createTemporary(),
+             .task = {}});
     _addImageFeedback(load->start);
 
     platform::TransferFiles files;
@@ -214,8 +218,8 @@ void ClientStateManager::_startImageFetch(const ImageFetch& fetch)
     task->resume();
 }
 
-void ClientStateManager::_endImageFetch(const ImageLoad& load, const std::optional<UrlResponse>& response,
-                                        const std::optional<Error>& error)
+void ImageLoader::_endImageFetch(const Load& load, const std::optional<UrlResponse>& response,
+                                 const std::optional<Error>& error)
 {
     const std::string& url = load.url.string();
     const int statusCode = response ? response->statusCode : 0;
@@ -238,7 +242,7 @@ void ClientStateManager::_endImageFetch(const ImageLoad& load, const std::option
     });
 }
 
-void ClientStateManager::_keepImage(const ImageLoad& load, const UrlResponse& response)
+void ImageLoader::_keepImage(const Load& load, const UrlResponse& response)
 {
     if (!load.file) {
         log().error("opening file failed {}", load.file.error().description());
@@ -257,7 +261,7 @@ void ClientStateManager::_keepImage(const ImageLoad& load, const UrlResponse& re
                                                                    task ? task->timingData() : Value()));
 }
 
-void ClientStateManager::_addImageFeedback(std::shared_ptr<ZRFeedback> record)
+void ImageLoader::_addImageFeedback(std::shared_ptr<ZRFeedback> record)
 {
     const auto& manager = _assembly.clientSessionManager;
     if (!manager) return;
