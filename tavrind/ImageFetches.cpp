@@ -1,51 +1,91 @@
 #include "tavrind/ImageFetches.h"
 
+#include <utility>
+
 namespace tavrin {
 
 bool ImageFetches::join(const platform::Url& url, const ImageGroup& group)
 {
-    const auto found = _fetches.find(url.string());
-    if (found == _fetches.end()) return false;
+    const auto found = _entries.find(url.string());
+    if (found == _entries.end()) return false;
     Entry& entry = found->second;
     if (!group) return true;
-    if (!entry.begun && entry.groups.empty()) _awaited.push_back(found->first);
     entry.groups.push_back(group);
+    if (entry.turn && entry.lane == kAhead && _lanes[kAwaited].waiting < kWaiting) {
+        _leaveTurn(entry);
+        _wait(entry, kAwaited);
+    }
     return true;
 }
 
 bool ImageFetches::add(ImageFetch fetch, const ImageGroup& group)
 {
-    std::deque<std::string>& turns = group ? _awaited : _ahead;
-    if (turns.size() >= kWaiting) return false;
+    const LaneIndex lane = group ? kAwaited : kAhead;
+    if (_lanes[lane].waiting == kWaiting) return false;
     std::string key = fetch.url.string();
-    turns.push_back(key);
-    Entry& entry = _fetches.emplace(std::move(key), Entry{std::move(fetch), {}}).first->second;
+    Entry& entry = _entries.emplace(std::move(key), Entry{std::move(fetch), {}, lane, {}}).first->second;
     if (group) entry.groups.push_back(group);
+    _wait(entry, lane);
     return true;
 }
 
 std::optional<ImageFetch> ImageFetches::next()
 {
-    if (_underWay == kUnderWay) return std::nullopt;
-    for (std::deque<std::string>* turns : {&_awaited, &_ahead}) {
-        while (!turns->empty()) {
-            const auto found = _fetches.find(turns->front());
-            turns->pop_front();
-            if (found == _fetches.end() || found->second.begun) continue; // it had moved ahead
-            found->second.begun = true;
-            ++_underWay;
-            return found->second.fetch;
-        }
+    for (Lane& lane : _lanes) {
+        if (lane.underWay == kUnderWay || lane.ready.empty()) continue;
+        Host& host = *lane.ready.begin()->second;
+        Entry& entry = *host.waiting.begin()->second;
+        ++host.underWay;
+        ++lane.underWay;
+        _leaveTurn(entry);
+        return entry.fetch;
     }
     return std::nullopt;
 }
 
 void ImageFetches::end(const platform::Url& url)
 {
-    const auto found = _fetches.find(url.string());
-    if (found == _fetches.end() || !found->second.begun) return;
-    --_underWay;
-    _fetches.erase(found);
+    const auto found = _entries.find(url.string());
+    if (found == _entries.end() || found->second.turn) return;
+    Lane& lane = _lanes[found->second.lane];
+    --lane.hosts.at(url.host()).underWay;
+    --lane.underWay;
+    _update(lane, url.host());
+    _entries.erase(found);
+}
+
+/// Puts the entry at the end of a lane.
+void ImageFetches::_wait(Entry& entry, LaneIndex index)
+{
+    Lane& lane = _lanes[index];
+    entry.lane = index;
+    entry.turn = ++_lastTurn;
+    lane.hosts[entry.fetch.url.host()].waiting.emplace(*entry.turn, &entry);
+    ++lane.waiting;
+    _update(lane, entry.fetch.url.host());
+}
+
+/// Takes the entry out of those that wait in its lane.
+void ImageFetches::_leaveTurn(Entry& entry)
+{
+    Lane& lane = _lanes[entry.lane];
+    lane.hosts.at(entry.fetch.url.host()).waiting.erase(*entry.turn);
+    entry.turn.reset();
+    --lane.waiting;
+    _update(lane, entry.fetch.url.host());
+}
+
+/// Settles when the host's next fetch may begin, after its fetches have changed; forgets a host without fetches.
+void ImageFetches::_update(Lane& lane, const std::string& name)
+{
+    Host& host = lane.hosts.at(name);
+    if (host.ready) lane.ready.erase(*std::exchange(host.ready, std::nullopt));
+    if (host.waiting.empty()) {
+        if (host.underWay == 0) lane.hosts.erase(name);
+    } else if (host.underWay < kUnderWayOfHost) {
+        host.ready = host.waiting.begin()->first;
+        lane.ready.emplace(*host.ready, &host);
+    }
 }
 
 } // namespace tavrin

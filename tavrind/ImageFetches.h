@@ -1,7 +1,9 @@
 #pragma once
 
+#include <array>
 #include <cstddef>
-#include <deque>
+#include <cstdint>
+#include <map>
 #include <memory>
 #include <optional>
 #include <string>
@@ -13,52 +15,76 @@
 
 namespace tavrin {
 
-/// Keeps someone waiting for fetches: whoever holds a copy is one of them, and the wait is over with the last copy.
+/// Keeps someone waiting for fetches: every holder of a copy is one of them, and the wait ends with the last copy.
 using ImageGroup = std::shared_ptr<void>;
 
-/// One image that is to be fetched, or is on its way.
+/// One image to be fetched, or under way.
 struct ImageFetch {
     platform::Url url;
-    std::optional<platform::Duration> timeoutInterval; ///< none is the session's
+    std::optional<platform::Duration> timeoutInterval; ///< none: the session's
 };
 
-/// Which images are on their way, and which wait for their turn.
+/// Decides which image is fetched next; does no I/O.
 ///
 ///     add ──► waiting ──► next ──► under way ──► end
 ///
-/// Each URL is here once. As many as `kUnderWay` are under way; the others follow in the order in which they came,
-/// those that someone waits for before those that are fetched ahead. One queue at a time.
+/// Each URL is here once, in one of two lanes: images that a client waits for, and images that are fetched ahead. Each
+/// lane has slots of its own, so that fetches ahead that hang keep no client waiting, and in each lane a host takes a
+/// third of the slots at most, so that a host that hangs keeps no other host's images from being fetched. Apart from
+/// that, fetches begin in the order in which they were added, those that a client waits for first.
+///
+/// Not synchronised: one thread at a time.
 class ImageFetches {
 public:
-    /// Each takes a descriptor, and a connection where the service doesn't multiplex.
+    /// Slots of a lane. Each fetch takes a descriptor, and a connection if the service doesn't multiplex.
     static constexpr std::size_t kUnderWay = 24;
-    /// Answers may name any number of images, and clients may ask for any number: so many of each may wait.
+    /// Slots of a lane that one host may take.
+    static constexpr std::size_t kUnderWayOfHost = 8;
+    /// Fetches that may wait in a lane: answers may name, and clients ask for, any number of images.
     static constexpr std::size_t kWaiting = 10'000;
 
-    /// Takes part in the fetch of that URL, which moves ahead if it has to wait and `group` isn't null. False where
-    /// there is none.
+    /// Adds `group` to the fetch of that URL and returns true; returns false if there is none. A waiting fetch that
+    /// gets its first group changes to the lane of those that clients wait for. A null group only asks.
     bool join(const platform::Url& url, const ImageGroup& group);
-    /// Adds the fetch of a URL that isn't here; a null group is none. False where too many are waiting.
+    /// Adds the fetch of a URL that isn't here, for a client if `group` isn't null. Returns false if too many wait.
     bool add(ImageFetch fetch, const ImageGroup& group);
-    /// The fetch that is to begin now, which is under way from here on; none where all wait for one that has begun.
+    /// The fetch to begin now, which is under way from here on; none if there is no free slot for any that waits.
     [[nodiscard]] std::optional<ImageFetch> next();
-    /// Forgets a fetch that was under way, and lets its groups go.
+    /// Removes a fetch that was under way, and releases its groups. Does nothing for any other URL.
     void end(const platform::Url& url);
 
-    [[nodiscard]] std::size_t underWay() const { return _underWay; }
-    [[nodiscard]] std::size_t waiting() const { return _fetches.size() - _underWay; }
+    [[nodiscard]] std::size_t underWay() const { return _lanes[kAwaited].underWay + _lanes[kAhead].underWay; }
+    [[nodiscard]] std::size_t waiting() const { return _lanes[kAwaited].waiting + _lanes[kAhead].waiting; }
 
 private:
+    using Turn = std::uint64_t;
+    enum LaneIndex { kAwaited, kAhead };
+
     struct Entry {
         ImageFetch fetch;
         std::vector<ImageGroup> groups;
-        bool begun = false;
+        LaneIndex lane;
+        std::optional<Turn> turn; // none: under way
+    };
+    struct Host {
+        std::map<Turn, Entry*> waiting;
+        std::size_t underWay = 0;
+        std::optional<Turn> ready; // its place in Lane::ready
+    };
+    struct Lane {
+        std::unordered_map<std::string, Host> hosts; // those with a fetch
+        std::map<Turn, Host*> ready;                 // hosts whose first waiting fetch may begin, by its turn
+        std::size_t underWay = 0;
+        std::size_t waiting = 0;
     };
 
-    std::unordered_map<std::string, Entry> _fetches; // by URL
-    std::deque<std::string> _awaited; // the turns; one that has moved ahead has an idle one in the other list
-    std::deque<std::string> _ahead;
-    std::size_t _underWay = 0;
+    void _wait(Entry& entry, LaneIndex lane);
+    void _leaveTurn(Entry& entry);
+    void _update(Lane& lane, const std::string& host);
+
+    std::unordered_map<std::string, Entry> _entries; // by URL
+    std::array<Lane, 2> _lanes;                      // by LaneIndex
+    Turn _lastTurn = 0;
 };
 
 } // namespace tavrin

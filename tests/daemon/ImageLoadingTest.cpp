@@ -124,44 +124,84 @@ TEST(ResponseImages, AreOrderedByWhatIsKnownOfThem)
     EXPECT_EQ(again.primary.size(), 2u) << "the bag has no template";
 }
 
-TEST(ImageFetches, TakeTurnsAndThoseAwaitedFirst)
-{
+struct ImageFetchesTest : testing::Test {
+    /// "host/image".
+    static Url url(const std::string& name) { return *Url::parse("https://" + name); }
+    bool add(const std::string& name, const ImageGroup& group = nullptr) { return fetches.add({url(name), {}}, group); }
+    bool join(const std::string& name, const ImageGroup& group) { return fetches.join(url(name), group); }
+    /// What begins now, in order.
+    Strings begun()
+    {
+        Strings names;
+        while (const auto fetch = fetches.next()) names.push_back(fetch->url.string().substr(8));
+        return names;
+    }
+    Strings end(const std::string& name)
+    {
+        fetches.end(url(name));
+        return begun();
+    }
+    static std::string on(std::size_t host, std::size_t image) { return fmt::format("h{}/{}", host, image); }
+
     ImageFetches fetches;
-    const auto url = [](std::size_t i) { return *Url::parse(fmt::format("https://a.example/{}", i)); };
-    const auto next = [&] {
-        const auto fetch = fetches.next();
-        return fetch ? fetch->url.string().substr(18) : "none";
-    };
-    for (std::size_t i = 0; i < ImageFetches::kUnderWay; ++i) {
-        EXPECT_TRUE(fetches.add({url(i), {}}, nullptr));
-        EXPECT_EQ(next(), std::to_string(i));
-    }
-    for (std::size_t i : {100, 101, 102}) EXPECT_TRUE(fetches.add({url(i), {}}, nullptr));
-    EXPECT_EQ(next(), "none");
-    const auto group = std::make_shared<int>();
-    EXPECT_TRUE(fetches.add({url(103), {}}, group));
-    EXPECT_TRUE(fetches.join(url(0), group)) << "it is under way";
-    EXPECT_TRUE(fetches.join(url(101), group)) << "it moves ahead";
-    EXPECT_TRUE(fetches.join(url(101), group));
-    EXPECT_TRUE(fetches.join(url(100), nullptr)) << "it doesn't";
-    EXPECT_FALSE(fetches.join(url(104), group));
-    EXPECT_EQ(group.use_count(), 5);
+    const std::shared_ptr<int> client = std::make_shared<int>();
+};
 
-    fetches.end(url(100)); // it hasn't begun
-    fetches.end(url(104)); // nobody knows it
-    EXPECT_EQ(next(), "none");
-    const std::pair<std::size_t, const char*> turns[]{{0, "103"}, {1, "101"}, {2, "100"}, {3, "102"}, {4, "none"}};
-    for (const auto& [ended, expected] : turns) {
-        fetches.end(url(ended));
-        EXPECT_EQ(next(), expected);
+TEST_F(ImageFetchesTest, BeginInTurn)
+{
+    Strings added;
+    for (std::size_t i = 0; i < ImageFetches::kUnderWay + 3; ++i) {
+        added.push_back(on(i % 9, i));
+        EXPECT_TRUE(add(added.back()));
     }
-    EXPECT_EQ(group.use_count(), 4) << "the first has ended";
-    fetches.end(url(101));
-    EXPECT_EQ(group.use_count(), 2);
+    EXPECT_EQ(begun(), Strings(added.begin(), added.end() - 3));
+    EXPECT_TRUE(join(added[0], client)) << "it is under way";
+    EXPECT_TRUE(join(added.back(), nullptr)) << "nobody waits for it, so it stays where it is";
+    EXPECT_FALSE(join("h1/x", client));
+    EXPECT_TRUE(end("h1/x").empty()) << "nobody knows it";
+    EXPECT_TRUE(end(added.back()).empty()) << "it hasn't begun";
+    EXPECT_EQ(client.use_count(), 2);
+    for (std::size_t i = 0; i < 3; ++i) EXPECT_EQ(end(added[i]), Strings{added[ImageFetches::kUnderWay + i]});
+    EXPECT_EQ(client.use_count(), 1) << "its fetch has ended";
+    EXPECT_TRUE(end(added[3]).empty());
+    EXPECT_EQ(fetches.underWay(), ImageFetches::kUnderWay - 1);
+}
 
-    for (std::size_t i = 0; i < ImageFetches::kWaiting; ++i) EXPECT_TRUE(fetches.add({url(1000 + i), {}}, nullptr));
-    EXPECT_FALSE(fetches.add({url(200), {}}, nullptr));
-    EXPECT_TRUE(fetches.add({url(200), {}}, group)) << "those awaited don't wait for these";
+TEST_F(ImageFetchesTest, ThoseThatAClientWaitsForHaveSlotsOfTheirOwn)
+{
+    for (std::size_t i = 0; i < ImageFetches::kUnderWay + 3; ++i) EXPECT_TRUE(add(on(i, i)));
+    EXPECT_EQ(begun().size(), ImageFetches::kUnderWay);
+    EXPECT_TRUE(add("a/1", client));
+    EXPECT_EQ(begun(), Strings{"a/1"});
+    EXPECT_TRUE(join("h26/26", client));
+    EXPECT_TRUE(join("h26/26", client));
+    EXPECT_EQ(begun(), Strings{"h26/26"}) << "it changes lanes";
+    EXPECT_EQ(end("h0/0"), Strings{"h24/24"});
+    for (std::size_t i = 2; i < ImageFetches::kUnderWay; ++i) EXPECT_TRUE(add(on(100 + i, 0), client));
+    EXPECT_EQ(begun().size(), ImageFetches::kUnderWay - 2);
+    EXPECT_TRUE(add("b/1", client));
+    EXPECT_TRUE(end("h24/24") == Strings{"h25/25"} && begun().empty()) << "slots of the one aren't the other's";
+    EXPECT_EQ(end("h26/26"), Strings{"b/1"});
+}
+
+TEST_F(ImageFetchesTest, NoHostTakesMoreThanItsShare)
+{
+    for (std::size_t i = 0; i < 2 * ImageFetches::kUnderWayOfHost; ++i) EXPECT_TRUE(add(on(1, i)));
+    for (const char* other : {"h2/0", "h3/0"}) EXPECT_TRUE(add(other));
+    EXPECT_EQ(begun(), (Strings{"h1/0", "h1/1", "h1/2", "h1/3", "h1/4", "h1/5", "h1/6", "h1/7", "h2/0", "h3/0"}));
+    EXPECT_TRUE(end("h2/0").empty());
+    EXPECT_EQ(end("h1/4"), Strings{"h1/8"});
+    EXPECT_TRUE(join("h1/12", client) && join("h1/10", client));
+    EXPECT_EQ(begun(), (Strings{"h1/12", "h1/10"})) << "those that a client waits for have a share of their own";
+    EXPECT_EQ(end("h1/0"), Strings{"h1/9"});
+    EXPECT_EQ(end("h1/1"), Strings{"h1/11"}) << "the tenth has begun";
+}
+
+TEST_F(ImageFetchesTest, SoManyMayWait)
+{
+    for (std::size_t i = 0; i < ImageFetches::kWaiting; ++i) EXPECT_TRUE(add(on(i, i)));
+    EXPECT_FALSE(add("a/1"));
+    EXPECT_TRUE(add("a/1", client)) << "those that a client waits for don't wait for these";
     EXPECT_EQ(fetches.waiting(), ImageFetches::kWaiting + 1);
 }
 
@@ -447,13 +487,10 @@ TEST_F(ImageLoadingTest, TenThousandImagesTakeTurns)
 
     auto call = load({image("https://a.example/wanted"), image("https://host9000.example/9000")});
     EXPECT_TRUE(call->pending());
+    EXPECT_EQ(fetches().size(), ImageFetches::kUnderWay + 2) << "what hangs ahead keeps no client waiting";
     fetches()[0]->respond(200, "a");
     device.drain();
     EXPECT_EQ(cached("https://host0.example/0"), "a");
-    EXPECT_EQ(fetched().back(), "https://a.example/wanted") << "even where no more may wait of those fetched ahead";
-    fetches()[0]->respond(200, "b");
-    device.drain();
-    EXPECT_EQ(fetched().back(), "https://host9000.example/9000") << "what is awaited goes before what is fetched ahead";
     answerAll();
     ASSERT_TRUE(call->answered());
     EXPECT_EQ(bytes(*call, "https://host9000.example/9000"), "pixels");
