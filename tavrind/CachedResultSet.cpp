@@ -17,13 +17,13 @@ using platform::Value;
 
 std::optional<Date> expireTimeOf(const Value& resultSet, Date now)
 {
-    constexpr double kLongest = 1e9; // some 30 years: no date lies beyond what a Date holds
+    constexpr double kLongest = 1e9; // seconds, about 30 years: keeps the sum within the range of a Date
     const double maxAge = resultSet["max_age"].asDouble().value_or(0);
     if (maxAge == 0) return std::nullopt;
     return now + platform::durationFromSeconds(std::clamp(maxAge, -kLongest, kLongest));
 }
 
-/// No larger than it needs to be: it is kept.
+/// The text of a reply with this set alone, without spare capacity: it is kept.
 platform::Bytes answerWith(const Value& resultSet)
 {
     std::string text = platform::toJson(Value::Array{resultSet});
@@ -73,7 +73,7 @@ std::size_t CachedResultSet::resultSetSize() const
 CachedUse useOf(const CachedResultSet& set, std::size_t typedLength, double scale, Date now)
 {
     if (set.expireTime && *set.expireTime <= now) return CachedUse::Expired;
-    // The service is told the scale to a tenth, so what is nearer than that is the same to it.
+    // The header carries the scale to a tenth: scales that round to the same tenth are the same to the service.
     constexpr double kSameScale = 0.05 + 1e-6;
     if (scale > 0 && std::abs(scale - set.uiScale) > kSameScale) return CachedUse::OtherScale;
     return typedLength >= set.inputLength ? CachedUse::Candidate : CachedUse::OtherInput;

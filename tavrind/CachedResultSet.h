@@ -13,11 +13,11 @@
 
 namespace tavrin {
 
-/// One result set of an answer of the service, as the query cache keeps it: as the text that answers, so that a hit
-/// makes nothing. Immutable and shared.
+/// One result set of an answer of the service. It keeps the JSON text of the reply, so that a cache hit shares bytes
+/// and encodes nothing. Immutable; any thread.
 struct CachedResultSet : std::enable_shared_from_this<CachedResultSet> {
     /// `input` is what the user had typed, `resultSet` an element of the answer to `request`, `uuid` that of the
-    /// request's start record. The set is usable from `now` for the seconds of its "max_age": without end for none.
+    /// request's start record. The set expires "max_age" seconds after `now`; without "max_age", or with 0, never.
     CachedResultSet(std::string_view input, std::shared_ptr<const platform::UrlRequest> request,
                     const platform::Value& resultSet, std::string uuid, platform::Date now);
 
@@ -28,28 +28,28 @@ struct CachedResultSet : std::enable_shared_from_this<CachedResultSet> {
     const std::optional<platform::Date> expireTime;
 
     // Derived from the above.
-    const std::string query;       ///< the completed query that the set is for, in lower case; may be empty
+    const std::string query;       ///< "query", the completed query that the set is for, in lower case; may be empty
     const std::size_t inputLength; ///< in UTF-16 units
     const std::size_t queryLength; ///< in UTF-16 units
-    const float completionScore;   ///< the service's; 0 for none
-    const float uiScale;           ///< of the client's screen, as the service was told; 0 for none
-    [[nodiscard]] std::optional<platform::Uuid> userGuid() const; ///< as the service was told
-    [[nodiscard]] platform::Value resultSet() const;              ///< read from the answer
+    const float completionScore;   ///< "completion_score"; 0 if missing
+    const float uiScale;           ///< header "X-Quorvane-UI-Scale" of the request; 0 if missing
+    [[nodiscard]] std::optional<platform::Uuid> userGuid() const; ///< header "X-Quorvane-UserGuid" of the request
+    [[nodiscard]] platform::Value resultSet() const;              ///< parsed anew from `answer` by each call
     [[nodiscard]] std::size_t resultSetSize() const;              ///< in bytes of JSON
 };
 
-/// What a look-up does with a set whose query begins with what was typed.
+/// What a look-up does with a set whose query begins with the text typed.
 enum class CachedUse {
-    Expired,    ///< drop it
-    OtherScale, ///< its images are for another screen
-    OtherInput, ///< more had been typed when it was fetched
-    Candidate,
+    Expired,    ///< remove it
+    OtherScale, ///< skip it: its images are for another screen
+    OtherInput, ///< skip it: it was fetched for a longer input
+    Candidate,  ///< it may answer
 };
-/// `typedLength` is in UTF-16 units, `scale` that of the client's screen; 0 takes any.
+/// `typedLength` is in UTF-16 units; `scale` is that of the client's screen, compared to a tenth, and 0 takes any set.
 [[nodiscard]] CachedUse useOf(const CachedResultSet& set, std::size_t typedLength, double scale, platform::Date now);
 
-/// The set that answers: of the shortest query; of those that with the highest score, if that is positive; of those the
-/// first. Null for no candidates.
+/// The candidate with the shortest query; among equally short ones the highest positive score decides, then the order.
+/// Null if there are no candidates.
 [[nodiscard]] const CachedResultSet* pickCompletion(std::span<const CachedResultSet* const> candidates);
 
 } // namespace tavrin

@@ -5,7 +5,7 @@
 
 namespace tavrin {
 namespace {
-constexpr std::chrono::milliseconds kDelayOnFail{1500}; // does not grow with the attempt
+constexpr std::chrono::milliseconds kDelayOnFail{1500};
 }
 
 std::shared_ptr<platform::UrlTask> dataTaskWithRetryableRequest(platform::Device& device,
@@ -13,7 +13,7 @@ std::shared_ptr<platform::UrlTask> dataTaskWithRetryableRequest(platform::Device
                                                                 TAVRetryableNetworkRequest request, unsigned attempt,
                                                                 unsigned retriesLeft, RetryCompletion completion)
 {
-    // The completion reads its own task's timing data. The task owns the completion, and lives until that has run.
+    // The completion needs its own task for the timing data. The task owns the completion and outlives its run.
     auto cell = std::make_shared<std::weak_ptr<platform::UrlTask>>();
     const platform::UrlRequest httpRequest = request.httpRequest;
     auto task = session->dataTask(

@@ -13,21 +13,22 @@ struct Device;
 
 namespace tavrin {
 
-/// A request and until when, and how, it is tried again after a transport error.
+/// A request with its retry policy for transport errors.
 struct TAVRetryableNetworkRequest {
     platform::UrlRequest httpRequest; ///< sent on every attempt, unchanged
-    /// After this moment a failure is final. None counts as a moment long past: such a request is never repeated.
+    /// A failure after this moment is final. None counts as a moment long past: the request is never repeated.
     std::optional<platform::Date> expire;
-    bool delayOnFail = false; ///< wait 1.5 s before a repetition
+    bool delayOnFail = false; ///< wait 1.5 s before each repetition; the delay does not grow
 };
 
-/// Called once, by the last attempt, on the session's delegate queue, with that attempt's timing data.
+/// Called once, for the last attempt, on the session's delegate queue, with that attempt's timing data.
 using RetryCompletion =
     std::move_only_function<void(std::optional<platform::Bytes> data, std::optional<platform::UrlResponse> response,
                                  std::optional<platform::Error> error, platform::Value timingData)>;
 
-/// The first attempt's task, which the caller resumes; repetitions are made and resumed here. An HTTP error status is
-/// no failure. Any thread.
+/// Returns the task of the first attempt, suspended; later attempts are created and resumed here, `retriesLeft` at
+/// most. Only a transport error is repeated: an HTTP error status counts as success. Cancelling the returned task ends
+/// the first attempt only. Any thread.
 [[nodiscard]] std::shared_ptr<platform::UrlTask>
 dataTaskWithRetryableRequest(platform::Device& device, std::shared_ptr<platform::UrlSession> session,
                              TAVRetryableNetworkRequest request, unsigned attempt, unsigned retriesLeft,

@@ -66,7 +66,7 @@ std::optional<std::string> TavrinService::clientIDForConnection(platform::Proces
 
 void TavrinService::listenerShouldAcceptNewConnection(std::shared_ptr<ipc::Connection> connection)
 {
-    // The peer is looked up in its own file system, which may be slow or stuck: not on the listener's thread.
+    // Off the listener's thread: identifying the peer reads its own file system, which may be slow or stuck.
     connection->queue()->async([self = shared_from_this(), connection] { self->_accept(connection); });
 }
 

@@ -17,22 +17,22 @@ namespace tavrin {
 struct Assembly;
 class ClientConnection;
 
-/// Accepts the clients' connections and keeps one `ClientConnection` for each, from its acceptance until its session
-/// was flushed after its invalidation. Any thread.
+/// Accepts the clients' connections and owns one `ClientConnection` for each, from its acceptance until its session has
+/// been flushed after its invalidation. Reports the daemon's state to diagnostic tools. Any thread, unless marked.
 class TavrinService : public TAVDiagnosticsXPC, public std::enable_shared_from_this<TavrinService> {
 public:
-    /// Makes the assembly's GUID controller, session manager and flusher bridge too.
+    /// Also creates the assembly's GUID controller, session manager and flusher bridge.
     static std::shared_ptr<TavrinService> make(Assembly& assembly);
     explicit TavrinService(Assembly& assembly);
     ~TavrinService() override;
 
-    /// Takes a new connection; always accepts, soon. Run loop's thread.
+    /// Accepts the connection on its own queue; none is refused. Run loop's thread.
     void listenerShouldAcceptNewConnection(std::shared_ptr<platform::ipc::Connection> connection);
 
-    /// A snapshot.
+    /// A snapshot of the connections, in the order in which they were accepted.
     [[nodiscard]] std::vector<std::shared_ptr<ClientConnection>> getClientConnections() const;
 
-    /// The peer's application id, else the last part of its executable's path; none for a process that isn't there.
+    /// The peer's application id, else the last component of its executable's path; none if the process is gone.
     [[nodiscard]] static std::optional<std::string> clientIDForConnection(platform::ProcessIdentity& processes,
                                                                           pid_t pid);
 

@@ -63,7 +63,7 @@ platform::UrlRequest TavrinURLRequestBuilder::createMutableUrlRequest() const
     platform::UrlComponents components = _urlComponents;
     components.setQueryItems(items);
     if (auto query = components.percentEncodedQuery()) {
-        // A query may hold ";", which some servers take for a separator.
+        // RFC 3986 allows ";" in a query, but some servers split the query there.
         for (std::size_t at = query->find(';'); at != std::string::npos; at = query->find(';', at))
             query->replace(at, 1, "%3B");
         components.setPercentEncodedQuery(std::move(query));

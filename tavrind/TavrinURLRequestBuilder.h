@@ -13,11 +13,12 @@ namespace tavrin {
 
 /// Collects the query items and headers of one request.
 ///
-/// What a request must carry is forced and replaces what is there; what it may carry is defaulted and never does. The
-/// base URL's own query items are forced first. There is one item for each name and one header for each name (compared
-/// exactly), and the query is sorted by name, so equal items always give the same URL.
+/// A forced item or header replaces the one of its name; a default is only added if there is none of its name. The base
+/// URL's own query items are forced first, so that a default never replaces them. There is one item and one header for
+/// each name, compared exactly. The query is sorted by name: equal items always give the same URL, whatever the order
+/// in which they were added.
 ///
-/// Short-lived; one thread.
+/// Short-lived. Not synchronised: one thread at a time.
 class TavrinURLRequestBuilder {
 public:
     [[nodiscard]] static TavrinURLRequestBuilder requestBuilderWithURL(const platform::Url& url);
@@ -25,18 +26,18 @@ public:
 
     [[nodiscard]] bool containsQueryItemWithName(std::string_view name) const { return _queryItems.contains(name); }
     void forceQueryItem(platform::QueryItem item);
-    /// Without a value: a bare name, without "=".
+    /// An item without a value is sent as its bare name, without "=".
     void forceQueryItemWithName(std::string name, std::optional<std::string> value);
     void forceQueryItemsFromArray(const std::vector<platform::QueryItem>& items);
     void defaultQueryItem(platform::QueryItem item);
     void defaultQueryItemWithName(std::string_view name, std::optional<std::string> value);
 
     [[nodiscard]] bool containsHttpHeaderWithName(std::string_view name) const { return _httpHeaders.contains(name); }
-    /// Without a value: removes the header.
+    /// No value removes the header.
     void forceHttpHeaderWithName(std::string name, std::optional<std::string> value);
     void defaultHttpHeaderWithName(std::string_view name, std::string value);
 
-    /// The request so far, to be changed further; may be called again.
+    /// The request as collected so far, with default method, cache policy and time-out. May be called repeatedly.
     [[nodiscard]] platform::UrlRequest createMutableUrlRequest() const;
     [[nodiscard]] const platform::UrlRequest createUrlRequest() const { return createMutableUrlRequest(); }
 
