@@ -1,5 +1,7 @@
 #include "tavrind/Exchange.h"
 
+#include <functional>
+
 #include <fmt/format.h>
 
 #include "CoreTavrin/ClientVocabulary.h"
@@ -34,6 +36,7 @@ namespace tavrin {
 using platform::Bytes;
 using platform::Error;
 using platform::JsonDocument;
+using platform::Private;
 using platform::UrlRequest;
 using platform::UrlResponse;
 using platform::Value;
@@ -87,7 +90,7 @@ void Exchange::begin()
     const platform::Log& log = TavrinLogForCategory(_kind.logCategory);
     if (_kind.isSearch) {
         log.log("session {} performing query[{}] {}, reply {}", _client->identifier(), _request->queryId,
-                _request->queryString, _reply ? "expected" : "none");
+                Private{_request->queryString}, _reply ? "expected" : "none");
         if (const auto& name = _client->clientShortName())
             _assembly.diagnosticData.addValue(1, createCounterKey(*name, "keystrokes"));
     } else {
@@ -103,7 +106,7 @@ void Exchange::_perform(bool hasBag)
     const platform::Log& log = TavrinLogForCategory(_kind.logCategory);
     if (_kind.needsBag && (!hasBag || !_view.bag)) {
         if (_kind.isSearch)
-            log.error("Bag fetch failed, can't complete non-cached query {}.", _request->queryString);
+            log.error("Bag fetch failed, can't complete non-cached query {}.", Private{_request->queryString});
         else
             log.error("Bag fetch failed, can't complete non-cached {}.", _kind.name);
         _answer(nullptr, makeTAVError(TAVErrorTimeout, "timeout"));
@@ -124,7 +127,7 @@ bool Exchange::_isSkipped()
         return true;
     }
     if (_kind.isSearch && platform::utf16Length(_request->queryString) < _view.bag->minimumQueryLength()) {
-        log.log("query[{}] input '{}' less than minQueryLength", _request->queryId, _request->queryString);
+        log.log("query[{}] input '{}' less than minQueryLength", _request->queryId, Private{_request->queryString});
         _answer(nullptr, {});
         _skipSearch(SkipSearchTrigger::LessThanMinimumQueryLength);
         return true;
@@ -159,7 +162,8 @@ void Exchange::_send()
 {
     const platform::Log& log = TavrinLogForCategory(_kind.logCategory);
     if (_kind.isSearch)
-        log.log("Dispatching network request for (id, query): ({}, {})", _request->queryId, _request->queryString);
+        log.log("Dispatching network request for (id, query): ({}, {})", _request->queryId,
+                Private{_request->queryString});
     else
         log.log("Dispatching network request for {}", _kind.name);
 
@@ -168,14 +172,16 @@ void Exchange::_send()
     const auto guids = _client->guidController();
     const double timeout = _view.configuration ? _view.configuration->timeoutIntervalForRequest : 0;
     const std::string userAgent = _view.userAgent.value_or("");
-    auto built = ((*_assembly.requestFactory).*_kind.builder)(
-        {.request = *_request,
-         .bag = _view.bag.get(),
-         // Reading the GUID may roll it, which empties query caches: only a request that is about to be built does so.
-         .userGuid = guids ? guids->currentUserGUID() : platform::Uuid(),
-         .userAgent = userAgent,
-         .fieldMask = tavrin_caseInsensitiveContainsString(userAgent, "messages") ? kFieldMaskNoLocation : 0,
-         .timeout = timeout > 0 ? std::optional(requestTimeout(timeout)) : std::nullopt});
+    // Reading the GUID may roll it, which empties query caches: only a request that is about to be built does so.
+    const platform::Uuid userGuid = guids ? guids->currentUserGUID() : platform::Uuid();
+    const ClientRequest parts{
+        .request = *_request,
+        .bag = _view.bag.get(),
+        .userGuid = userGuid,
+        .userAgent = userAgent,
+        .fieldMask = tavrin_caseInsensitiveContainsString(userAgent, "messages") ? kFieldMaskNoLocation : 0,
+        .timeout = timeout > 0 ? std::optional(requestTimeout(timeout)) : std::nullopt};
+    auto built = std::invoke(_kind.builder, *_assembly.requestFactory, parts);
     if (!built) {
         const Error error = makeTAVError(TAVErrorInvalidResponse, "no URL");
         log.error("no URL for the {}", _kind.name);
@@ -214,7 +220,7 @@ void Exchange::_completed(std::optional<Bytes> data, std::optional<UrlResponse> 
     if (response) recordSearchResult(statusCode);
     const std::size_t responseSize = data ? data->size() : 0;
     if (_kind.isSearch)
-        log.log("Got network response for (id, query): ({}, {})", _request->queryId, _request->queryString);
+        log.log("Got network response for (id, query): ({}, {})", _request->queryId, Private{_request->queryString});
     else
         log.log("Got network response for {}", _kind.name);
     log.debug("resp: {}", statusCode);
@@ -225,7 +231,7 @@ void Exchange::_completed(std::optional<Bytes> data, std::optional<UrlResponse> 
         return failSearchFeedback(error, responseSize, statusCode, timingData);
     }
     if (!response || !response->isHttp) {
-        log.error("not http response? {}", response ? response->url.string() : "none");
+        log.error("not http response? {}", Private{response ? response->url.string() : "none"});
         error = makeTAVError(TAVErrorInvalidResponse, "invalid response class");
         _answer(nullptr, error);
         return failSearchFeedback(error, responseSize, statusCode, timingData);

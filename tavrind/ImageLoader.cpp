@@ -26,6 +26,7 @@ namespace tavrin {
 
 using platform::Dictionary;
 using platform::Error;
+using platform::Private;
 using platform::Url;
 using platform::UrlResponse;
 using platform::Value;
@@ -142,7 +143,7 @@ Value ImageLoader::_cachedImages(const Value::Array& images, const TAVBag& bag) 
     std::size_t size = 0;
     const auto map = [&](const std::string& name, platform::Bytes image) {
         if (size + image.size() > kMaximumAnswer)
-            return log().error("no room for {} bytes of image {}", image.size(), name);
+            return log().error("no room for {} bytes of image {}", image.size(), Private{name});
         size += image.size();
         loaded.set(name, std::move(image));
     };
@@ -151,12 +152,12 @@ Value ImageLoader::_cachedImages(const Value::Array& images, const TAVBag& bag) 
         const std::string* identifier = image["id"].asString();
         if ((url && loaded.contains(*url)) || (!url && identifier && loaded.contains(*identifier))) continue;
         if (const auto data = _cachedImage(url ? Url::parse(*url) : std::nullopt); !data.empty()) {
-            log().log("mapping image url {} to {} bytes of data", *url, data.size());
+            log().log("mapping image url {} to {} bytes of data", Private{*url}, data.size());
             map(*url, data);
         } else if (identifier && !loaded.contains(*identifier)) {
             const auto other = _cachedImage(bag.urlForIdentifier(*identifier));
             if (other.empty()) continue;
-            log().log("mapping image id {} to {} bytes of data", *identifier, other.size());
+            log().log("mapping image id {} to {} bytes of data", Private{*identifier}, other.size());
             map(*identifier, other);
         }
     }
@@ -174,12 +175,12 @@ void ImageLoader::_fetchImageURL(const Url& url, std::optional<platform::Duratio
                                  const ImageGroup& group)
 {
     _imageQueue->assertOnQueue();
-    if (!url.scheme().starts_with("http")) return log().fault("invalid url scheme: {}", url.string());
+    if (!url.scheme().starts_with("http")) return log().fault("invalid url scheme: {}", Private{url.string()});
     if (_imageFetches.join(url, group)) return _startImageFetches(); // it may have changed lanes
     const auto cache = _assembly.urlSession->cache();
-    if (cache && cache->find(url)) return log().log("found {} in cache", url.string());
+    if (cache && cache->find(url)) return log().log("found {} in cache", Private{url.string()});
     if (!_imageFetches.add({url, timeoutInterval}, group))
-        return log().error("{} images wait already, not fetching {}", ImageFetches::kWaiting, url.string());
+        return log().error("{} images wait already, not fetching {}", ImageFetches::kWaiting, Private{url.string()});
     _startImageFetches();
 }
 
@@ -190,7 +191,7 @@ void ImageLoader::_startImageFetches()
 
 void ImageLoader::_startImageFetch(const ImageFetch& fetch)
 {
-    log().log("fetching image {}", fetch.url.string());
+    log().log("fetching image {}", Private{fetch.url.string()});
     platform::Device& device = _assembly.device;
     platform::UrlRequest request{
         .url = fetch.url, .timeout = fetch.timeoutInterval, .maximumResponseSize = kMaximumImage};
@@ -224,14 +225,14 @@ void ImageLoader::_endImageFetch(const Load& load, const std::optional<UrlRespon
     const std::string& url = load.url.string();
     const int statusCode = response ? response->statusCode : 0;
     if (error) {
-        log().error("Error fetching image {}: {}", url, error->description());
+        log().error("Error fetching image {}: {}", Private{url}, error->description());
         ClientSessionManager::reportErrorAsTavrindFeedback(
             makeTAVError(TAVErrorInvalidResponse, fmt::format("image fetch error {}", error->description())),
             _assembly);
     } else if (statusCode != 200) {
-        log().error("Bad status code {} for image {}", statusCode, url);
+        log().error("Bad status code {} for image {}", statusCode, Private{url});
     } else {
-        log().log("Fetched image {}", url);
+        log().log("Fetched image {}", Private{url});
         _keepImage(load, *response);
     }
     _imageQueue->async([weak = weak_from_this(), ended = load.url] {
@@ -254,7 +255,7 @@ void ImageLoader::_keepImage(const Load& load, const UrlResponse& response)
         log().error("mmap failed {}", image.error().description());
         return ClientSessionManager::reportErrorAsTavrindFeedback(image.error(), _assembly);
     }
-    log().log("caching {} bytes for {}", image->size(), load.url.string());
+    log().log("caching {} bytes for {}", image->size(), Private{load.url.string()});
     if (const auto cache = _assembly.urlSession->cache()) cache->store(load.url, response, *image);
     const auto task = load.task.lock();
     _addImageFeedback(std::make_shared<ZREndNetworkSearchFeedback>(load.start, image->size(), response.statusCode,

@@ -13,6 +13,8 @@
 
 namespace tavrin {
 
+using platform::Private;
+
 namespace {
 
 constexpr std::size_t kMaximumCost = 0x200000;
@@ -79,7 +81,8 @@ bool QueryCache::_isKept(const CachedResultSet& set)
 {
     if (set.query.empty() || set.query.contains('\0')) return false;
     if (set.inputLength <= set.queryLength) return true;
-    log().error("BUG: NOT caching '{}' because input is longer than completed query '{}'", set.input, set.query);
+    log().error("BUG: NOT caching '{}' because input is longer than completed query '{}'", Private{set.input},
+                Private{set.query});
     return false;
 }
 
@@ -102,8 +105,8 @@ void QueryCache::_store(std::shared_ptr<const CachedResultSet> set)
 {
     _queue->assertOnQueue();
     const std::size_t cost = costOf(*set);
-    if (cost >= kMaximumCost) return log().error("NOT caching '{}' with cost {}", set->query, cost);
-    log().log("caching '{}' with cost {}", set->query, cost);
+    if (cost >= kMaximumCost) return log().error("NOT caching '{}' with cost {}", Private{set->query}, cost);
+    log().log("caching '{}' with cost {}", Private{set->query}, cost);
     if (_currentCost + cost >= kMaximumCost) {
         log().log("!!! exceeded max cost, flushing cache !!!");
         _clearCache();

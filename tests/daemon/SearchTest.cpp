@@ -3,6 +3,7 @@
 #include "platform/values/Dictionary.h"
 #include "searchrecords/ZRErrorFeedback.h"
 #include "searchrecords/ZRNetworkFeedback.h"
+#include "tavrind/TavrinLogging.h"
 #include "tavrind/TAVTracing.h"
 #include "tests/support/DaemonFixture.h"
 
@@ -236,6 +237,26 @@ TEST_F(SearchTest, TheBagsArrivalWakesEveryWaiterOfAClient)
     device.drain();
     EXPECT_TRUE(first->pending() && second->pending());
     EXPECT_EQ(tasks().size(), 3u) << "the bag and both searches";
+}
+
+TEST_F(SearchTest, TheLogDoesNotTellWhatTheUserTypesAndSees)
+{
+    using platform::LogLevel;
+    platform::Log::privateData = false;
+    platform::test::LogCapture log;
+    auto connection = client();
+    (void)search(*connection, 1, "secret");
+    respond(R"([{"query": "secret words", "icon": {"url": "https://a.example/secret"}}, {"query": "secr"}])");
+    respond("pixels"); // the image's
+    (void)search(*connection, 2, "secret w");
+    (void)search(*connection, 3, "secret", {{"queryItems", Value::Array{Dictionary{{"class", "TAVQueryItem"}}}}});
+    lastTask()->finish(platform::Bytes("[]"), platform::UrlResponse{.isHttp = false}, std::nullopt);
+    device.drain();
+    for (unsigned category = 0; category < TavrinLoggingCategoryCount; ++category)
+        for (const auto level : {LogLevel::Info, LogLevel::Default, LogLevel::Error, LogLevel::Fault})
+            EXPECT_FALSE(log.has(level, TavrinLogForCategory(category).category(), "secret")) << category;
+    EXPECT_GT(log.count("<private>"), 8);
+    platform::Log::privateData = true;
 }
 
 // ---- What the kinds of request have of their own
