@@ -160,6 +160,7 @@ TEST(LookupFilter, KeepsResultsWhoseKeywordsCompletionAndSubjectFit)
     }
 
     platform::test::LogCapture log;
+    platform::Log::privateData = false;
     request.queryContext.reset();
     Value response = platform::parseJson(R"([{"results": [{"lookup_instructions": {"completion": "x"}}]}])").value();
     Lookup::filterLookupResultsWithRequest(request, response, "");
