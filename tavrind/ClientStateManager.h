@@ -11,6 +11,10 @@ namespace platform {
 class Queue;
 }
 
+namespace platform {
+struct UrlSource;
+} // namespace platform
+
 namespace tavrin {
 
 struct Assembly;
@@ -38,7 +42,8 @@ public:
     void saveState();
 
     // Images: passed on to the image loader.
-    void processImagesFromResponse(const platform::Value& response, const std::shared_ptr<const TAVBag>& bag);
+    void processImagesFromResponse(const platform::Value& response, const std::shared_ptr<const TAVBag>& bag,
+                                   platform::UrlSource source);
     [[nodiscard]] std::set<std::string> validImageHosts() const;
     void loadImages(platform::Value::Array images, std::uint64_t timeout,
                     platform::Reply<platform::Value> reply) override;

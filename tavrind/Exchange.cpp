@@ -12,6 +12,7 @@
 #include "CoreTavrin/TAVRequest.h"
 #include "CoreTavrin/TAVSessionConfiguration.h"
 #include "platform/device/Device.h"
+#include "platform/net/UrlRedirect.h"
 #include "platform/run/Clock.h"
 #include "platform/text/Text.h"
 #include "platform/values/Dictionary.h"
@@ -242,9 +243,11 @@ void Exchange::_completed(std::optional<Bytes> data, std::optional<UrlResponse> 
     // Stored before the reply, so that a client that has seen an answer finds it in the cache. The reply needs the text
     // alone: the sets are made on the cache's queue, not here.
     const bool cached = document && _mayCache(*document);
+    const platform::UrlSource source = platform::sourceOf(*response);
     if (cached)
         _client->queryCache()->setMade(
-            [self = shared_from_this(), document] { return self->_useAnswer(*document, true); }, _cacheGeneration);
+            [self = shared_from_this(), document, source] { return self->_useAnswer(*document, source, true); },
+            _cacheGeneration);
 
     auto reply = std::make_shared<TAVReply>();
     reply->scale = _request->scale;
@@ -257,8 +260,8 @@ void Exchange::_completed(std::optional<Bytes> data, std::optional<UrlResponse> 
     _answer(std::move(reply), document ? OptionalError() : decoded.error());
 
     if (document && !cached)
-        _assembly.device.globalQueue(platform::Priority::Default)->async([self = shared_from_this(), document] {
-            (void)self->_useAnswer(*document, false);
+        _assembly.device.globalQueue(platform::Priority::Default)->async([self = shared_from_this(), document, source] {
+            (void)self->_useAnswer(*document, source, false);
         });
     endNetworkFeedback(document.get(), responseSize, statusCode, timingData);
     _forceFetch(*response);
@@ -272,12 +275,13 @@ bool Exchange::_mayCache(const JsonDocument& answer) const
 
 /// Has the answer's images fetched ahead, and returns the result sets to be cached. On the cache's queue, or on a
 /// global one if nothing is to be cached.
-std::vector<std::shared_ptr<const CachedResultSet>> Exchange::_useAnswer(const JsonDocument& document, bool cached)
+std::vector<std::shared_ptr<const CachedResultSet>> Exchange::_useAnswer(const JsonDocument& document,
+                                                                         platform::UrlSource source, bool cached)
 {
     const bool preload = !_view.configuration || !_view.configuration->dontPreloadImages;
     if (!preload && !cached) return {};
     const Value response = document.value();
-    if (preload) _assembly.clientStateManager->processImagesFromResponse(response, _view.bag);
+    if (preload) _assembly.clientStateManager->processImagesFromResponse(response, _view.bag, source);
     if (!cached) return {};
 
     std::vector<std::shared_ptr<const CachedResultSet>> sets;

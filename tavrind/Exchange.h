@@ -50,8 +50,8 @@ private:
                     std::optional<platform::Error> error, const platform::Value& timingData);
     void _answer(std::shared_ptr<TAVReply> record, OptionalError error);
     [[nodiscard]] bool _mayCache(const platform::JsonDocument& answer) const;
-    [[nodiscard]] std::vector<std::shared_ptr<const CachedResultSet>> _useAnswer(const platform::JsonDocument& document,
-                                                                                 bool cached);
+    [[nodiscard]] std::vector<std::shared_ptr<const CachedResultSet>>
+    _useAnswer(const platform::JsonDocument& document, platform::UrlSource source, bool cached);
     void _forceFetch(const platform::UrlResponse& response);
 
     void _addFeedback(std::shared_ptr<ZRFeedback> record, std::uint64_t clientQueryId);

@@ -12,6 +12,7 @@
 
 #include "platform/base/Date.h"
 #include "platform/net/Url.h"
+#include "platform/net/UrlSession.h"
 
 namespace tavrin {
 
@@ -22,6 +23,7 @@ using ImageGroup = std::shared_ptr<void>;
 struct ImageFetch {
     platform::Url url;
     std::optional<platform::Duration> timeoutInterval; ///< none: the session's
+    platform::UrlSource source;                        ///< of the answer that named the image
 };
 
 /// Decides which image is fetched next; does no I/O.

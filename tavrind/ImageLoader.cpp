@@ -9,6 +9,7 @@
 #include "CoreTavrin/TAVError.h"
 #include "platform/device/Device.h"
 #include "platform/net/HttpCache.h"
+#include "platform/net/UrlRedirect.h"
 #include "platform/run/Clock.h"
 #include "platform/run/Queue.h"
 #include "platform/run/Transactions.h"
@@ -37,8 +38,6 @@ using namespace std::chrono_literals;
 
 /// Limit of a client's wait, whatever it asks for.
 constexpr platform::Duration kLongestLoad = 60s;
-/// Limit of a fetch in all: the time-out of a request only limits the time without data.
-constexpr platform::Duration kLongestFetch = 5min;
 /// Bytes: the largest response that the HTTP cache stores.
 constexpr std::size_t kMaximumImage = 10u << 20;
 /// Bytes: half of the limit of an array in a D-Bus message.
@@ -66,7 +65,6 @@ struct ImageLoader::Load {
     platform::Transactions::Token transaction;
     std::shared_ptr<ZRStartNetworkSearchFeedback> start;
     platform::Result<platform::FileHandle> file;
-    platform::Clock::TimerId limit = 0;
     std::weak_ptr<platform::UrlTask> task; // owns this
 };
 
@@ -88,12 +86,14 @@ void ImageLoader::_addImageHosts(const std::set<std::string>& hosts)
     }
 }
 
-void ImageLoader::processImagesFromResponse(const Value& response, const std::shared_ptr<const TAVBag>& bag)
+void ImageLoader::processImagesFromResponse(const Value& response, const std::shared_ptr<const TAVBag>& bag,
+                                            platform::UrlSource source)
 {
     if (!bag) return;
-    _imageQueue->async([weak = weak_from_this(), response, bag] {
+    _imageQueue->async([weak = weak_from_this(), response, bag, source] {
         const auto self = weak.lock();
         if (!self) return;
+        self->_source = source;
         OrderedImages images;
         std::set<std::string> seen;
         enumerateImagesInResponse(response,
@@ -102,7 +102,7 @@ void ImageLoader::processImagesFromResponse(const Value& response, const std::sh
         self->_imageHostsQueue->barrierAsync([weak, hosts = std::move(images.hosts)] {
             if (const auto loader = weak.lock()) loader->_addImageHosts(hosts);
         });
-        self->_fetchImages(inOrder(std::move(images)), *bag, nullptr);
+        self->_fetchImages(inOrder(std::move(images)), *bag, source, nullptr);
     });
 }
 
@@ -119,7 +119,10 @@ void ImageLoader::loadImages(Value::Array images, std::uint64_t timeout, platfor
     const auto done = std::make_shared<platform::Event>();
     _imageQueue->async([weak = weak_from_this(), urls = inOrder(std::move(found)), bag,
                         group = ImageGroup(done.get(), [done](void*) { done->signal(); })] {
-        if (const auto self = weak.lock()) self->_fetchImages(urls, *bag, group);
+        const auto self = weak.lock();
+        if (!self) return;
+        const auto presumed = platform::sourceOf(bag->searchURL().value_or(Url()));
+        self->_fetchImages(urls, *bag, self->_source.value_or(presumed), group);
     });
     const platform::Duration limit(
         static_cast<std::int64_t>(std::min(timeout, static_cast<std::uint64_t>(kLongestLoad.count()))));
@@ -164,22 +167,23 @@ Value ImageLoader::_cachedImages(const Value::Array& images, const TAVBag& bag) 
     return loaded;
 }
 
-void ImageLoader::_fetchImages(const std::vector<Url>& urls, const TAVBag& bag, const ImageGroup& group)
+void ImageLoader::_fetchImages(const std::vector<Url>& urls, const TAVBag& bag, platform::UrlSource source,
+                               const ImageGroup& group)
 {
     const auto seconds = bag.timeoutIntervalForRequest();
     const auto timeout = seconds ? std::optional(requestTimeout(*seconds)) : std::nullopt;
-    for (const Url& url : urls) _fetchImageURL(url, timeout, group);
+    for (const Url& url : urls) _fetchImageURL(url, timeout, source, group);
 }
 
 void ImageLoader::_fetchImageURL(const Url& url, std::optional<platform::Duration> timeoutInterval,
-                                 const ImageGroup& group)
+                                 platform::UrlSource source, const ImageGroup& group)
 {
     _imageQueue->assertOnQueue();
     if (!url.scheme().starts_with("http")) return log().fault("invalid url scheme: {}", Private{url.string()});
     if (_imageFetches.join(url, group)) return _startImageFetches(); // it may have changed lanes
     const auto cache = _assembly.urlSession->cache();
     if (cache && cache->find(url)) return log().log("found {} in cache", Private{url.string()});
-    if (!_imageFetches.add({url, timeoutInterval}, group))
+    if (!_imageFetches.add({url, timeoutInterval, source}, group))
         return log().error("{} images wait already, not fetching {}", ImageFetches::kWaiting, Private{url.string()});
     _startImageFetches();
 }
@@ -193,8 +197,10 @@ void ImageLoader::_startImageFetch(const ImageFetch& fetch)
 {
     log().log("fetching image {}", Private{fetch.url.string()});
     platform::Device& device = _assembly.device;
-    platform::UrlRequest request{
-        .url = fetch.url, .timeout = fetch.timeoutInterval, .maximumResponseSize = kMaximumImage};
+    platform::UrlRequest request{.url = fetch.url,
+                                 .timeout = fetch.timeoutInterval,
+                                 .maximumResponseSize = kMaximumImage,
+                                 .source = fetch.source};
     const auto load = std::make_shared<Load>(
         Load{.url = fetch.url,
              .transaction = device.transactions.begin("imageFetch"),
@@ -207,15 +213,11 @@ void ImageLoader::_startImageFetch(const ImageFetch& fetch)
     if (load->file) files.download = load->file->duplicate();
     const auto task = _assembly.urlSession->transferTask(
         std::move(request), std::move(files),
-        [weak = weak_from_this(), load, &device](auto, const std::optional<UrlResponse>& response,
-                                                 const std::optional<Error>& error) {
-            device.clock.cancel(load->limit);
+        [weak = weak_from_this(), load](auto, const std::optional<UrlResponse>& response,
+                                        const std::optional<Error>& error) {
             if (const auto self = weak.lock()) self->_endImageFetch(*load, response, error);
         });
     load->task = task;
-    load->limit = device.clock.after(kLongestFetch, [task = load->task] {
-        if (const auto endless = task.lock()) endless->cancel();
-    });
     task->resume();
 }
 

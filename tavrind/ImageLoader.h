@@ -35,11 +35,14 @@ class ImageLoader : public std::enable_shared_from_this<ImageLoader> {
 public:
     explicit ImageLoader(Assembly& assembly);
 
-    /// Starts to fetch the images of an answer, and returns. Without a bag it does nothing.
-    void processImagesFromResponse(const platform::Value& response, const std::shared_ptr<const TAVBag>& bag);
+    /// Starts to fetch the images of an answer, and returns. Without a bag it does nothing. `source` says where the
+    /// answer came from: its image URLs lead no further than a redirect from there.
+    void processImagesFromResponse(const platform::Value& response, const std::shared_ptr<const TAVBag>& bag,
+                                   platform::UrlSource source);
     /// Fetches images ({"url", "id"}) and replies with the bytes of those that the cache has after `timeout`
     /// nanoseconds (a minute at most), by "url" or else "id". One reply holds 32 MiB of images; further ones are left
-    /// out.
+    /// out. Clients name images of answers, so that the source of the last answer holds for them; before the first
+    /// one, that of the bag's search URL.
     void loadImages(platform::Value::Array images, std::uint64_t timeout, platform::Reply<platform::Value> reply);
     /// Hosts of the images that were asked for or named in answers, the first 1000. For diagnostics.
     [[nodiscard]] std::set<std::string> validImageHosts() const;
@@ -48,9 +51,10 @@ private:
     struct Load;
 
     void _addImageHosts(const std::set<std::string>& hosts);
-    void _fetchImages(const std::vector<platform::Url>& urls, const TAVBag& bag, const ImageGroup& group);
+    void _fetchImages(const std::vector<platform::Url>& urls, const TAVBag& bag, platform::UrlSource source,
+                      const ImageGroup& group);
     void _fetchImageURL(const platform::Url& url, std::optional<platform::Duration> timeoutInterval,
-                        const ImageGroup& group);
+                        platform::UrlSource source, const ImageGroup& group);
     void _startImageFetches();
     void _startImageFetch(const ImageFetch& fetch);
     void _endImageFetch(const Load& load, const std::optional<platform::UrlResponse>& response,
@@ -64,7 +68,8 @@ private:
     std::shared_ptr<platform::Queue> _imageHostsQueue;
     std::set<std::string> _validImageHosts; // on _imageHostsQueue
     std::shared_ptr<platform::Queue> _imageQueue;
-    ImageFetches _imageFetches; // on _imageQueue
+    ImageFetches _imageFetches;                 // on _imageQueue
+    std::optional<platform::UrlSource> _source; // of the last answer; on _imageQueue
 };
 
 } // namespace tavrin
