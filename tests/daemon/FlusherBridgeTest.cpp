@@ -2,6 +2,7 @@
 
 #include "platform/values/Dictionary.h"
 #include "platform/values/Json.h"
+#include "tavrind/TavrinBagController.h"
 #include "tavrind/TavrinFlusherXPC.h"
 #include "tests/support/FeedbackFixture.h"
 
@@ -133,6 +134,21 @@ TEST_F(BridgeTest, AnUnknownCommandChangesNothing)
     last->end();
     device.drain();
     EXPECT_EQ(log.count("Removed remote listener"), 1);
+}
+
+TEST_F(BridgeTest, BodiesAreShownEvenIfTheBagNamesNoEndpoint)
+{
+    begin();
+    assembly().bagController->forceFetchBag(Value::dictionaryOf({{"bag", 1000}}));
+    device.drain();
+    respond(R"({"version": "1001", "searchURL": "https://s.example/search"})");
+    const auto dumper = tool();
+    intent(*dumper, 2);
+    (void)dumper->takePushes();
+    appear();
+    intent(*dumper, 3);
+    EXPECT_GT(std::ranges::count(signals(*dumper), "FlushedData"), 0);
+    EXPECT_TRUE(uploads().empty());
 }
 
 TEST_F(BridgeTest, EachToolGetsWhatItAskedFor)
