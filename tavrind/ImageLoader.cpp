@@ -40,8 +40,8 @@ using namespace std::chrono_literals;
 constexpr platform::Duration kLongestLoad = 60s;
 /// Bytes: the largest response that the HTTP cache stores.
 constexpr std::size_t kMaximumImage = 10u << 20;
-/// Bytes: half of the limit of an array in a D-Bus message.
-constexpr std::size_t kMaximumAnswer = 32u << 20;
+/// Bytes in one answer: less than may wait to be read by all clients together (`ipc::Limits::unreadBytes`).
+constexpr std::size_t kMaximumAnswer = 16u << 20;
 constexpr std::size_t kMaximumHosts = 1000;
 
 const platform::Log& log()

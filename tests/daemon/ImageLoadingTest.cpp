@@ -536,7 +536,7 @@ TEST_F(ImageLoadingTest, AnAnswerHoldsSoManyBytesOnly)
     assembly().urlSession = device.loader.makeSession(
         {.cache = platform::HttpCacheConfiguration{.memoryCapacity = 400u << 20, .clock = &device.clock}},
         device.device.serialQueue("test.urlSession"));
-    const std::string large(9u << 20, 'x');
+    const std::string large(5u << 20, 'x');
     Value::Array images;
     for (int i = 0; i < 4; ++i) images.push_back(image(fmt::format("https://a.example/{}", i)));
     auto call = load(images);
