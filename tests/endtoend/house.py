@@ -24,7 +24,7 @@ TIMEOUT = 60  # seconds for anything to happen, on a busy machine
 
 
 class Failure(Exception):
-    """A program did something else than it should."""
+    """A program did not do what it should."""
 
 
 def check(holds, what):
@@ -129,7 +129,7 @@ class House:
         return self.json("search", query).get("outcome")
 
     def answered(self):
-        """If a search is answered within five. Each waits a second for the bag, which a busy machine may take longer for."""
+        """True if one of five searches is answered. Each waits up to a second for the bag; a busy machine may need longer."""
         return any(self.outcome() == "answered" for _ in range(5))
 
     def books(self):
@@ -161,7 +161,7 @@ class House:
     # ---- Waiting
 
     def soon(self, holds, what):
-        """Waits until `holds()`, which is tried ten times a second: what another process does sends no event here."""
+        """Waits until `holds()`, which is called ten times a second: there is no event for what other processes do."""
         end = time.monotonic() + TIMEOUT
         while not (result := holds()):
             check(time.monotonic() < end, what() if callable(what) else what)

@@ -43,7 +43,7 @@ SslContext makeTls(const tavrin::tools::CertificateFiles& files, const std::stri
     return context;
 }
 
-/// The bytes of a request that is whole, or 0.
+/// Parses a complete request and returns its length; 0 if it is incomplete.
 std::size_t requestLength(const std::string& bytes, TestHttpServer::Request& request)
 {
     const std::size_t end = bytes.find("\r\n\r\n");
@@ -87,7 +87,7 @@ struct TestHttpServer::Impl {
     FileHandle wake{eventfd(0, EFD_CLOEXEC)};
     std::uint16_t port = 0;
     SslContext tls;
-    std::map<int, Connection> open; // by descriptor; server's thread
+    std::map<int, Connection> open; // by descriptor; server thread only
 
     mutable std::mutex mutex;
     std::condition_variable arrived;
@@ -136,7 +136,7 @@ struct TestHttpServer::Impl {
         }
     }
 
-    /// Does what the test asks for; false ends the server.
+    /// Handles a wake-up by the test. Returns false to stop the server.
     bool obey()
     {
         eventfd_t count = 0;
@@ -166,7 +166,7 @@ struct TestHttpServer::Impl {
         open.emplace(fd, std::move(connection));
     }
 
-    /// Reads what is there and answers whole requests; false ends the connection.
+    /// Reads available bytes and answers complete requests. Returns false to close the connection.
     bool serve(Connection& connection)
     {
         do {
@@ -196,7 +196,7 @@ struct TestHttpServer::Impl {
         return true;
     }
 
-    /// Sends the answer; false ends the connection.
+    /// Sends the answer. Returns false to close the connection.
     static bool answer(Connection& connection, const Answer& answer)
     {
         send(connection, answer.bytes);
@@ -209,7 +209,7 @@ struct TestHttpServer::Impl {
         return answer.then == Then::KeepOpen;
     }
 
-    /// A client that went away is the client's affair.
+    /// Ignores errors: the client may have closed the connection.
     static void send(Connection& connection, std::string_view bytes)
     {
         while (!bytes.empty()) {

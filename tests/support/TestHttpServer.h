@@ -16,8 +16,8 @@
 
 namespace platform::test {
 
-/// An HTTP server on a loopback port whose answers are bytes that the test chooses, sound or not. One thread of its own
-/// serves every connection; the test's thread makes and destroys it.
+/// An HTTP server on a loopback port whose answers are arbitrary bytes, valid HTTP or not. One thread serves all
+/// connections. Created, destroyed and called on the test's thread unless noted otherwise.
 class TestHttpServer {
 public:
     struct Request {
@@ -25,14 +25,14 @@ public:
         std::string target; ///< path and query, as sent
         std::string head;   ///< request line and header fields, with their line ends
         std::string body;
-        int connection = 0;   ///< which connection it came on, from 1
-        bool resumed = false; ///< that connection took up an earlier TLS session
+        int connection = 0;   ///< number of its connection, from 1
+        bool resumed = false; ///< the connection resumed an earlier TLS session
 
-        /// The value of the first field of that name, written as `name` is; empty where there is none.
+        /// Returns the value of the first field with exactly this name; empty if there is none.
         [[nodiscard]] std::string header(std::string_view name) const;
     };
-    /// What becomes of the connection once the bytes are sent. KeepOpen with an incomplete answer is a server that
-    /// hangs.
+    /// What to do with the connection after sending the bytes. KeepOpen with an incomplete answer simulates a server
+    /// that hangs.
     enum class Then { KeepOpen, Close, Reset };
     struct Answer {
         std::string bytes;
@@ -56,7 +56,7 @@ public:
     [[nodiscard]] std::uint16_t port() const;
     [[nodiscard]] int connections() const;
     [[nodiscard]] std::vector<Request> requests() const;
-    /// Blocks until `count` requests have been read in all.
+    /// Blocks until `count` requests were received in total.
     void waitForRequests(std::size_t count);
     /// Sends on every open connection what the handler didn't. Blocks until it is sent.
     void sendToAll(const Answer& answer);
@@ -66,12 +66,12 @@ private:
     std::unique_ptr<Impl> _impl;
 };
 
-/// A whole answer: status line, the fields given, Content-Length and body.
+/// Returns a complete answer: status line, `fields`, Content-Length and body.
 [[nodiscard]] std::string httpAnswer(int status, std::string_view body = {}, std::string_view fields = {});
 
-/// Answers every request with the entry for its target, others with 404.
+/// Answers each request with the entry for its target, or with 404 if there is none.
 [[nodiscard]] TestHttpServer::Handler byPath(std::map<std::string, TestHttpServer::Answer> answers);
-/// Answers every request alike.
+/// Gives every request the same answer.
 [[nodiscard]] TestHttpServer::Handler always(TestHttpServer::Answer answer);
 
 } // namespace platform::test
