@@ -27,6 +27,12 @@ OptionalError errorFromValue(const Value& value)
 
 namespace wire {
 
+void append(ipc::Message& message, Value value)
+{
+    if (!value.asDictionary()) value = Dictionary();
+    message.args.push_back(std::move(value));
+}
+
 void append(ipc::Message& message, const platform::Record& record)
 {
     message.args.push_back(platform::toValue(record));

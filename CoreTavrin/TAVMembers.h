@@ -64,6 +64,8 @@ void append(platform::ipc::Message& message, T value)
 {
     message.args.emplace_back(std::move(value));
 }
+/// A dictionary; anything else travels as an empty one.
+void append(platform::ipc::Message& message, platform::Value value);
 void append(platform::ipc::Message& message, const platform::Record& record);
 void append(platform::ipc::Message& message, const std::shared_ptr<const TAVBag>& bag);
 void append(platform::ipc::Message& message, const OptionalError& error);

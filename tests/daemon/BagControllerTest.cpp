@@ -310,8 +310,6 @@ TEST_F(BagFeedbackTest, AFetchIsASessionOfItsOwn)
     };
     const Value session = fetched(200);
     EXPECT_EQ(typesIn(session), (std::vector<std::string>{"network_search_start", "network_search_end"}));
-    EXPECT_EQ(session["fb"][0]["input"], Value(""));
-    EXPECT_EQ(session["fb"][0]["trigger_event"], Value("bag"));
     EXPECT_EQ(session["fb"][0]["endpoint_type"], Value("tavrin_bag"));
     EXPECT_EQ(session["agent"], Value("tavrind/0.1.0"));
     EXPECT_EQ(typesIn(fetched(500)).back(), "error");

@@ -414,7 +414,7 @@ TEST(Ipc, WhatAPeerSaidBeforeItVanishedStillArrivesAheadOfTheEnd)
 
 TEST(Ipc, InvalidationWritesTheLastAnswerAndDeliversNothingMore)
 {
-    Service service;
+    Service service({.unreadBytes = 2 * kBeyondSocketBuffers});
     auto client = service.connect();
     client->call(probe().name, method("Bye"), {{4 << 20}, {}}, [&](const CallResult& got) {
         ASSERT_TRUE(got) << got.error().message;
