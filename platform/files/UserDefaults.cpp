@@ -37,7 +37,8 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
     bool fileIsBroken = false;
     std::mutex writing; // one reader or writer of the file at a time; taken before `mutex`
     std::unique_ptr<FileWatch> watch;
-    int lockAttempts = 0; // in vain, since the last write; write queue only
+    int lockAttempts = 0;  // in vain, since the last write; write queue only, like the next
+    bool retrying = false; // a timer runs
 
     /// Returns what the file has, nothing if it is missing. Fails if it can't be read or isn't a JSON object.
     Result<Dictionary> readFile() const
@@ -81,11 +82,11 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
         const bool isLocked = !done && done.error().code == EWOULDBLOCK;
         lockAttempts = isLocked ? lockAttempts + 1 : 0;
         if (!isLocked) return;
-        {
-            std::lock_guard lock(mutex);
-            if (std::exchange(writeQueued, true)) return;
-        }
-        writeQueue->after(kLockDelay, [self = shared_from_this()] { self->writeSoon(); });
+        retrying = true;
+        writeQueue->after(kLockDelay, [self = shared_from_this()] {
+            self->retrying = false;
+            self->writeSoon();
+        });
     }
 
     /// Writes what was set over what the file has by now. Fails with EWOULDBLOCK, and has done nothing, if another
@@ -225,7 +226,9 @@ void UserDefaults::set(std::string_view key, Value value)
     if (!_impl->files) return;
     _impl->dirty.emplace(key);
     if (!_impl->writeQueue || std::exchange(_impl->writeQueued, true)) return;
-    _impl->writeQueue->async([impl = _impl] { impl->writeSoon(); });
+    _impl->writeQueue->async([impl = _impl] {
+        if (!impl->retrying) impl->writeSoon(); // else it is written then
+    });
 }
 
 Result<void> UserDefaults::synchronize()
