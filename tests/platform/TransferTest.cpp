@@ -199,7 +199,7 @@ TEST_F(TransferTest, ABackgroundUploadReachesTheServer)
     NetworkStatus network;
     network.set({});
     const auto waiter = std::make_shared<Waiter>();
-    const auto files = makeSystemFiles();
+    static const auto files = makeSystemFiles(); // a worker may be the last that holds the session
     const auto sessions = makeBackgroundSessions({.files = *files,
                                                   .loader = *loader,
                                                   .network = network,
