@@ -27,6 +27,7 @@ struct BusContext {
     struct Process {
         unsigned connections = 0;
         std::size_t bytes = 0;
+        bool refused = false; ///< one was refused since the last one closed
     };
 
     /// A part of what `process` makes the transport hold was `before` bytes, and is `now`.

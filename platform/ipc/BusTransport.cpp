@@ -94,7 +94,8 @@ private:
         const pid_t pid = credentials->pid;
         const auto process = _context->processes.try_emplace(pid).first;
         if (process->second.connections >= _context->limits.connectionsPerProcess) {
-            kLog.error("{}: refused process {}: it has {} connections", _label, pid, process->second.connections);
+            if (!std::exchange(process->second.refused, true)) // once, however often it tries
+                kLog.error("{}: refused process {}: it has {} connections", _label, pid, process->second.connections);
             return;
         }
         ++process->second.connections;
@@ -103,7 +104,9 @@ private:
         auto connection =
             BusConnection::make(_context, _interface, std::move(socket), Peer{pid, credentials->uid}, std::move(queue),
                                 [weak = weak_from_this(), context = _context.get(), pid] {
-                                    if (--context->processes[pid].connections == 0) context->processes.erase(pid);
+                                    const auto process = context->processes.find(pid);
+                                    process->second.refused = false;
+                                    if (--process->second.connections == 0) context->processes.erase(process);
                                     auto self = weak.lock();
                                     if (!self) return;
                                     --self->_open;
