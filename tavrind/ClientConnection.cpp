@@ -186,14 +186,18 @@ void ClientConnection::request(std::shared_ptr<TAVRequest> request, RequestReply
 void ClientConnection::search(const RequestKind& kind, std::shared_ptr<TAVRequest> request, RequestReply reply)
 {
     const std::int64_t queryId = request->queryId;
-    std::int64_t current = _currentQueryId;
-    if (queryId <= current || !_currentQueryId.compare_exchange_strong(current, queryId))
-        return reply(queryId, nullptr, {});
+    const bool accepted = [&] {
+        std::lock_guard order(_orderMutex);
+        std::int64_t current = _currentQueryId;
+        return queryId > current && _currentQueryId.compare_exchange_strong(current, queryId);
+    }();
+    if (!accepted) return reply(queryId, nullptr, {});
 
     RequestReply ordered([weak = weak_from_this(), queryId, reply = std::move(reply)](
                              std::int64_t, std::shared_ptr<TAVReply> record, OptionalError error) mutable {
         const auto self = weak.lock();
         if (!self) return reply.abandon();
+        std::lock_guard order(self->_orderMutex);
         if (self->_currentQueryId > queryId) return reply(queryId, nullptr, {});
         reply(queryId, std::move(record), std::move(error));
     });

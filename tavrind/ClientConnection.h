@@ -72,7 +72,10 @@ private:
     std::shared_ptr<TAVSessionConfiguration> _configuration;
     std::shared_ptr<ClientState> _state;
     std::atomic<std::int64_t> _currentQueryId = 0; // the highest accepted; only compare-and-swap raises it
-    std::atomic<bool> _reportedNoState = false;    ///< one error session for a connection
+    // Held while a query is accepted, and while an answer is checked and sent: else a newer query could be accepted and
+    // answered between the check of an older one and its delivery.
+    std::mutex _orderMutex;
+    std::atomic<bool> _reportedNoState = false; ///< one error session for a connection
     platform::NotificationCenter::Token _bagObserver;
 };
 
