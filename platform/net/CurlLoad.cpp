@@ -105,7 +105,8 @@ void CurlLoad::setOptions()
     set(CURLOPT_ERRORBUFFER, _errorText.data());
     set(CURLOPT_NOSIGNAL, 1L);
     set(CURLOPT_PROTOCOLS_STR, "http,https");
-    set(CURLOPT_HTTP_VERSION, static_cast<long>(CURL_HTTP_VERSION_2TLS));
+    // Over HTTP/2 libcurl 7.88 loses a status that comes before the body is sent, if the stream is reset behind it.
+    set(CURLOPT_HTTP_VERSION, static_cast<long>(hasUpload() ? CURL_HTTP_VERSION_1_1 : CURL_HTTP_VERSION_2TLS));
     // Over plain HTTP it would hold every request back until the first one is answered.
     set(CURLOPT_PIPEWAIT, _configuration.pipelining && _files && _hop.url.scheme() == "https" ? 1L : 0L);
     set(CURLOPT_FRESH_CONNECT, _fresh ? 1L : 0L);

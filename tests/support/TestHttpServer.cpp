@@ -27,19 +27,22 @@ template <auto Free> struct FreeWith {
 using SslContext = std::unique_ptr<SSL_CTX, FreeWith<SSL_CTX_free>>;
 using Ssl = std::unique_ptr<SSL, FreeWith<SSL_free>>;
 
-SslContext makeTls(const tavrin::tools::CertificateFiles& files, const std::string& protocol)
+SslContext makeTls(const tavrin::tools::CertificateFiles& files, bool anyProtocol)
 {
     SslContext context(SSL_CTX_new(TLS_server_method()));
     SSL_CTX_use_certificate_file(context.get(), files.certificate.c_str(), SSL_FILETYPE_PEM);
     SSL_CTX_use_PrivateKey_file(context.get(), files.key.c_str(), SSL_FILETYPE_PEM);
-    const auto choose = [](SSL*, const unsigned char** chosen, unsigned char* length, const unsigned char*, unsigned,
-                           void* wanted) {
-        const auto& only = *static_cast<const std::string*>(wanted);
-        *chosen = reinterpret_cast<const unsigned char*>(only.data());
-        *length = static_cast<unsigned char>(only.size());
+    const auto choose = [](SSL*, const unsigned char** chosen, unsigned char* length, const unsigned char* offered,
+                           unsigned offeredLength, void*) {
+        static constexpr unsigned char kKnown[] = "\x02h2\x08http/1.1";
+        unsigned char* found = nullptr;
+        if (SSL_select_next_proto(&found, length, kKnown, sizeof kKnown - 1, offered, offeredLength) !=
+            OPENSSL_NPN_NEGOTIATED)
+            return SSL_TLSEXT_ERR_NOACK;
+        *chosen = found;
         return SSL_TLSEXT_ERR_OK;
     };
-    if (!protocol.empty()) SSL_CTX_set_alpn_select_cb(context.get(), choose, const_cast<std::string*>(&protocol));
+    if (anyProtocol) SSL_CTX_set_alpn_select_cb(context.get(), choose, nullptr);
     return context;
 }
 
@@ -180,7 +183,7 @@ struct TestHttpServer::Impl {
 
         Request request{.connection = connection.number,
                         .resumed = connection.ssl && SSL_session_reused(connection.ssl.get()) == 1};
-        if (!options.protocol.empty()) {
+        if (options.anyProtocol) {
             request.body = std::exchange(connection.received, {});
             return answer(connection, handler(request));
         }
@@ -228,7 +231,7 @@ TestHttpServer::TestHttpServer(Handler handler, const Options& options) : _impl(
 {
     _impl->handler = std::move(handler);
     _impl->options = options;
-    if (options.certificate) _impl->tls = makeTls(*options.certificate, _impl->options.protocol);
+    if (options.certificate) _impl->tls = makeTls(*options.certificate, options.anyProtocol);
     _impl->listen();
     _impl->thread = std::thread([impl = _impl.get()] { impl->run(); });
 }

@@ -44,8 +44,8 @@ public:
     struct Options {
         std::string address = "127.0.0.1";                            ///< IPv4 or IPv6
         std::optional<tavrin::tools::CertificateFiles> certificate{}; ///< if set, the server speaks TLS
-        /// Negotiated over TLS in place of HTTP/1.1. What arrives then goes to the handler as it comes, as a body.
-        std::string protocol{};
+        /// Over TLS, HTTP/2 is chosen before HTTP/1.1, and what arrives goes to the handler as it comes, as a body.
+        bool anyProtocol = false;
     };
 
     explicit TestHttpServer(Handler handler);
