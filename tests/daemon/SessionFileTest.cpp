@@ -373,6 +373,7 @@ TEST_F(SessionFileTest, UploadsAreInOrderOfTime)
 TEST_F(SessionFileTest, FilesOfAnEarlierProcessAreCountedOneByOneAfterTheStart)
 {
     start();
+    device.files.files.clear(); // of the daemon's own sessions
     for (int i = 0; i < 3; ++i) closedFile({"a", "b"});
     std::vector<std::string> operations;
     device.files.fault = [&](std::string_view operation, const std::filesystem::path& path) {

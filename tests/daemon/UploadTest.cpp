@@ -150,7 +150,9 @@ TEST_F(UploadTest, CrowdsourcingRecordsGoOutOnTheirOwn)
     report("ZRCustomFeedback", {{"feedbackType", 2}, {"jsonFeedback", Value::Array{"seen"}}});
     EXPECT_EQ(counter("dp.submit"), 3);
     LogCapture log;
+    platform::Log::privateData = false;
     upload();
+    platform::Log::privateData = true;
     EXPECT_EQ(log.count("Invalid JSON Object <private> error not a dictionary"), 2);
     EXPECT_EQ(temporaryFiles(), 2u) << "what could not be written stays";
     ASSERT_EQ(uploads().size(), 1u);
