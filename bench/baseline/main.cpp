@@ -28,7 +28,7 @@ int main()
     std::vector<std::shared_ptr<ipc::Connection>> connections;
     listener->setAcceptor([&](std::shared_ptr<ipc::Connection> connection) {
         connection->exportObject([](std::string_view, const ipc::Message&, ipc::Responder reply) {
-            reply(ipc::Message{{platform::Value::Array()}, {}});
+            reply(ipc::Message{{platform::Value(platform::Value::Array())}, {}});
         });
         connection->resume();
         connections.push_back(std::move(connection));

@@ -104,9 +104,9 @@ private:
         auto connection =
             BusConnection::make(_context, _interface, std::move(socket), Peer{pid, credentials->uid}, std::move(queue),
                                 [weak = weak_from_this(), context = _context.get(), pid] {
-                                    const auto process = context->processes.find(pid);
-                                    process->second.refused = false;
-                                    if (--process->second.connections == 0) context->processes.erase(process);
+                                    const auto counted = context->processes.find(pid);
+                                    counted->second.refused = false;
+                                    if (--counted->second.connections == 0) context->processes.erase(counted);
                                     auto self = weak.lock();
                                     if (!self) return;
                                     --self->_open;

@@ -242,8 +242,8 @@ TEST_F(QueueThreads, WritersExcludeReaders)
 // A sync caller never needs a free worker: here the only one is busy until the caller is done.
 TEST_F(QueueThreads, SyncDoesNotDependOnAFreeWorker)
 {
+    std::latch release(1); // outlives the worker that waits for it
     WorkerPool pool(1);
-    std::latch release(1);
     pool.execute(Priority::Default, [&] { release.wait(); });
     auto queue = Queue::make("test.serial", Queue::Kind::Serial, pool, clock);
     int seen = 0;

@@ -49,6 +49,14 @@ public:
             });
         }
 
+        /// Ends it without a word to anyone.
+        void drop()
+        {
+            finished = true;
+            _completion = {};
+            _queue.reset(); // which may hold the end of this task, if nobody ran it
+        }
+
         bool resumed = false;
         bool finished = false;
         Value timing;
@@ -93,6 +101,14 @@ public:
         std::shared_ptr<Queue> _queue;
         std::shared_ptr<HttpCache> _cache;
     };
+
+    FakeUrlLoader() = default;
+    /// Breaks the rings of tasks that nobody answered, or whose end nobody ran.
+    ~FakeUrlLoader() override
+    {
+        for (const auto& session : sessions)
+            for (const auto& task : std::vector(session->tasks)) task->drop();
+    }
 
     std::shared_ptr<UrlSession> makeSession(UrlSessionConfiguration configuration,
                                             std::shared_ptr<Queue> queue) override
