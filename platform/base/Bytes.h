@@ -9,8 +9,7 @@ namespace platform {
 
 /// An immutable run of bytes: a response body, a mapped file, an upload.
 ///
-/// Copies and slices share the bytes and their owner (a string, a mapping), which the last of them releases. Any
-/// thread.
+/// Copies and slices share the bytes and their owner (a string, a mapping); the last of them releases it. Any thread.
 class Bytes {
 public:
     Bytes() = default;
@@ -31,7 +30,7 @@ public:
     [[nodiscard]] std::size_t size() const { return _view.size(); }
     [[nodiscard]] bool empty() const { return _view.empty(); }
 
-    /// Returns at most `count` bytes from `offset` on, which must not lie past the end.
+    /// Returns at most `count` bytes from `offset` on. Throws std::out_of_range if `offset` is past the end.
     [[nodiscard]] Bytes slice(std::size_t offset, std::size_t count = std::string_view::npos) const
     {
         return {_owner, _view.substr(offset, count)};

@@ -6,28 +6,29 @@
 
 namespace platform {
 
-/// A moment on the system clock, as read from `Clock::wallNow()`.
+/// A point in time on the system clock, as `Clock::wallNow()` returns it.
 using Date = std::chrono::sys_time<std::chrono::nanoseconds>;
 
 /// A span of time.
 using Duration = std::chrono::nanoseconds;
 
-// Conversions treat whole seconds and the rest apart: a double doesn't hold nanoseconds since 1970 exactly.
+// Conversions treat whole seconds and the fraction separately: a double can't hold nanoseconds since 1970 exactly.
 
-/// The seconds nearest to `d`.
+/// Returns the number of seconds in `d`, rounded to the nearest double.
 [[nodiscard]] inline double toSeconds(Duration d)
 {
     const auto whole = std::chrono::duration_cast<std::chrono::seconds>(d);
     return static_cast<double>(whole.count()) + std::chrono::duration<double>(d - whole).count();
 }
 
-/// Seconds since 1970, UTC.
+/// Returns the seconds since 1970, UTC.
 [[nodiscard]] inline double secondsSince1970(Date date)
 {
     return toSeconds(date.time_since_epoch());
 }
 
-/// The span nearest to `seconds`. Values beyond what nanoseconds hold (292 years) are clamped, NaN is zero.
+/// Returns the duration of `seconds`, rounded to a nanosecond. Clamps values that 64-bit nanoseconds can't hold (292
+/// years); returns zero for NaN.
 [[nodiscard]] inline Duration durationFromSeconds(double seconds)
 {
     constexpr double kLimit = 9.2e9;
@@ -38,8 +39,8 @@ using Duration = std::chrono::nanoseconds;
     return std::chrono::seconds(static_cast<std::int64_t>(whole)) + Duration(std::llround((seconds - whole) * 1e9));
 }
 
-/// The moment of a time of the operating system: seconds since 1970 and the nanoseconds beyond them. Clamped to the
-/// years 1970 to 2199, so that neither the difference of two such moments nor a sum with less than 60 years overflows.
+/// Converts a time of the operating system (a `timespec`: seconds since 1970 and nanoseconds). Clamps to the years 1970
+/// to 2199, so that neither the difference of two such dates nor a sum with less than 60 years overflows.
 [[nodiscard]] constexpr Date dateFromSystemTime(std::int64_t seconds, std::int64_t nanoseconds)
 {
     constexpr std::int64_t kLatest = 7'258'118'400;
@@ -47,7 +48,7 @@ using Duration = std::chrono::nanoseconds;
     return Date(std::chrono::seconds(seconds) + std::chrono::nanoseconds(nanoseconds));
 }
 
-/// The moment `seconds` after 1970, clamped like `durationFromSeconds`.
+/// Returns the date `seconds` after 1970, clamped like `durationFromSeconds`.
 [[nodiscard]] inline Date dateFromSecondsSince1970(double seconds)
 {
     return Date(durationFromSeconds(seconds));

@@ -2,7 +2,7 @@
 
 namespace platform {
 
-/// Owns an open file descriptor, or none, and closes it on destruction. One thread at a time.
+/// Owns a file descriptor, or none, and closes it on destruction. One thread at a time.
 class FileHandle {
 public:
     FileHandle() = default;
@@ -11,13 +11,13 @@ public:
     FileHandle(FileHandle&& other) noexcept : _fd(other.release()) {}
     FileHandle& operator=(FileHandle&& other) noexcept;
     ~FileHandle();
-    /// The descriptor, still owned by this handle; negative for none.
+    /// Returns the descriptor, which this handle still owns; negative if it has none.
     [[nodiscard]] int fd() const { return _fd; }
     [[nodiscard]] explicit operator bool() const { return _fd >= 0; }
-    /// Returns the descriptor, which the caller now owns.
+    /// Returns the descriptor and passes its ownership to the caller.
     int release();
-    /// Returns another descriptor of the same open file (offset and flags are shared); none if the process has too many
-    /// descriptors or this handle has none.
+    /// Returns a second descriptor of the same open file, close-on-exec; offset and flags are shared. Returns an empty
+    /// handle if the process has reached its limit of descriptors or this handle is empty.
     [[nodiscard]] FileHandle duplicate() const;
 
 private:

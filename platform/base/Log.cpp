@@ -26,7 +26,7 @@ spdlog::level::level_enum spdlogLevel(LogLevel level)
     return spdlog::level::err;
 }
 
-/// The sink; leaked so that threads may log while the process exits.
+/// Returns the sink, which is leaked: threads may log while the process exits.
 std::shared_ptr<spdlog::logger>& sink()
 {
     static auto& logger = *new std::shared_ptr<spdlog::logger>([] {
@@ -42,7 +42,7 @@ std::shared_ptr<spdlog::logger>& sink()
 std::mutex tapMutex;
 std::function<void(const LogLine&)> tap; // under tapMutex
 std::atomic<bool> tapped = false;
-std::atomic<LogLevel> sinkThreshold = LogLevel::Debug; // of the sink, while a tap sees every level
+std::atomic<LogLevel> sinkThreshold = LogLevel::Debug; // raised while a tap has lowered `Log::threshold`
 
 std::string withoutControlCharacters(std::string text)
 {

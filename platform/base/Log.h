@@ -12,20 +12,20 @@
 
 namespace platform {
 
-/// Levels in order of gravity. Operators read Default day by day. Error is a failure that was handled, Fault a mistake
-/// in the program or its caller.
+/// Levels in order of severity. Default is what operators read every day. Error is a failure that was handled; Fault is
+/// a bug in the program or its caller.
 enum class LogLevel { Debug, Info, Default, Error, Fault };
 
-/// Marks an argument that tells what the user typed, saw or received: queries, URLs, titles, bodies. It is logged as
+/// Marks an argument that reveals what the user typed, saw or received: queries, URLs, titles, bodies. It is logged as
 /// "<private>", except at the debug level or if `Log::privateData` is set. The text must outlive the log call.
 struct Private {
     std::string_view text;
 };
 
-/// A log handle: one category of one subsystem. Any thread; handles must outlive every call.
+/// A log handle: one category of one subsystem. Any thread; a handle must outlive every call.
 ///
-/// A message below the threshold costs one load: its arguments are not formatted. Of every text argument at most
-/// `kLongestArgument` bytes are written. Control characters are escaped, so that no argument can forge a line.
+/// A message below the threshold costs one atomic load: its arguments are not formatted. Text arguments are cut at
+/// `kLongestArgument` bytes. Control characters are escaped, so that no argument can forge a line.
 class Log {
 public:
     static constexpr std::size_t kLongestArgument = 200;
@@ -40,7 +40,7 @@ public:
     {
         write(LogLevel::Info, text, args...);
     }
-    /// At the default level.
+    /// Writes at LogLevel::Default.
     template <class... Args> void log(fmt::format_string<Args...> text, Args&&... args) const
     {
         write(LogLevel::Default, text, args...);
@@ -58,9 +58,9 @@ public:
     [[nodiscard]] const std::string& category() const { return _category; }
     [[nodiscard]] const std::string& subsystem() const { return _subsystem; }
 
-    /// The lowest level that is written; initially Default.
+    /// The lowest level that is written; Default at start.
     static std::atomic<LogLevel> threshold;
-    /// Whether private arguments are written at all levels; initially not.
+    /// If true, private arguments are written at all levels; false at start.
     static std::atomic<bool> privateData;
 
 private:
@@ -77,7 +77,7 @@ private:
         else
             return (argument);
     }
-    /// Cuts a long text between two characters and marks the cut with "…".
+    /// Cuts a text at a character boundary after at most `kLongestArgument` bytes and appends "…".
     static std::string shortened(std::string_view text);
     void emit(LogLevel level, std::string text) const;
 
@@ -85,7 +85,7 @@ private:
     std::string _category;
 };
 
-/// One written line.
+/// One line as a tap sees it. The texts are valid during the call.
 struct LogLine {
     LogLevel level;
     std::string_view subsystem;
@@ -93,14 +93,15 @@ struct LogLine {
     std::string_view text;
 };
 
-/// Where lines go; initially to standard error. Not to be changed while other threads log.
+/// Where lines go: standard error at start. Call `setLogSink` before other threads log. `program` is the journal's
+/// identifier.
 enum class LogSink { StandardError, Journal };
 void setLogSink(LogSink sink, std::string_view program);
 
-/// Sees every line of every level while it lives, in addition to the sink. For tests and diagnostics.
+/// Passes every line of every level to `tap` while it exists, in addition to the sink. For tests and diagnostics.
 ///
-/// Lowers the threshold to Debug; the sink keeps the one before. One at a time. Runs on the logging thread and must not
-/// log.
+/// Lowers the threshold to Debug; the sink keeps its old threshold. At most one tap may exist. `tap` runs on the
+/// logging thread, under a lock, and must not log.
 class LogTap {
 public:
     explicit LogTap(std::function<void(const LogLine&)> tap);
@@ -114,12 +115,12 @@ private:
 
 [[nodiscard]] std::string_view logLevelName(LogLevel level);
 
-/// The process's default log, for messages of no category.
+/// Returns the log for messages without a category.
 [[nodiscard]] const Log& defaultLog();
 
 } // namespace platform
 
-/// Lets the compiler check formats. `Log` itself never formats a `Private`.
+/// Needed only for the compile-time check of formats: `Log` replaces a `Private` before it formats.
 template <> struct fmt::formatter<platform::Private> : formatter<std::string_view> {
     auto format(const platform::Private&, format_context& context) const
     {

@@ -4,8 +4,9 @@
 
 namespace platform {
 
-/// Names the calling thread after the last word of a queue's label ("com.example.service.cache" → "cache",
-/// at most 15 bytes), so that a debugger and `top -H` show who works. Costs nothing if the name is set already.
+/// Names the calling thread after the last component of a label ("com.example.service.cache" → "cache"), so that a
+/// debugger and `top -H` show it. Linux limits names to 15 bytes; longer ones are cut. Makes no system call if the
+/// thread has that name already.
 void setThreadNameForLabel(std::string_view label);
 
 } // namespace platform

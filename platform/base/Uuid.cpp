@@ -15,7 +15,7 @@ constexpr bool isDashPosition(std::size_t i)
     return i == 8 || i == 13 || i == 18 || i == 23;
 }
 
-/// The value of a hexadecimal digit, or -1.
+/// Returns the value of a hexadecimal digit, or -1.
 constexpr int digitValue(char c)
 {
     if (c >= '0' && c <= '9') return c - '0';
@@ -29,7 +29,7 @@ constexpr int digitValue(char c)
 Uuid Uuid::random()
 {
     std::array<std::uint8_t, 16> bytes;
-    // Without randomness two identifiers could be equal, which no caller can handle.
+    // Without randomness two identifiers could be equal. No caller can handle that.
     if (RAND_bytes(bytes.data(), static_cast<int>(bytes.size())) != 1) std::abort();
     bytes[6] = static_cast<std::uint8_t>((bytes[6] & 0x0f) | 0x40);
     bytes[8] = static_cast<std::uint8_t>((bytes[8] & 0x3f) | 0x80);
