@@ -93,7 +93,7 @@ std::string_view trimmed(std::string_view text)
 }
 
 struct WordFinder::Impl {
-    std::unique_ptr<icu::BreakIterator> iterator; // null if ICU has none
+    std::unique_ptr<icu::BreakIterator> iterator; // null if ICU could not create one
 };
 
 WordFinder::WordFinder(const std::string& locale) : _impl(std::make_unique<Impl>())
@@ -114,7 +114,7 @@ std::vector<std::string> WordFinder::wordsIn(std::string_view text)
     whole.toUTF8String(utf8);
     std::size_t byte = 0;
     int32_t unit = 0;
-    const auto byteOf = [&](int32_t end) { // calls must not go back
+    const auto byteOf = [&](int32_t end) { // `end` must not decrease from call to call
         for (; unit < end; byte += static_cast<std::size_t>(U8_COUNT_TRAIL_BYTES(utf8[byte])) + 1)
             unit += static_cast<unsigned char>(utf8[byte]) < 0xf0 ? 1 : 2;
         return byte;
@@ -132,7 +132,7 @@ std::vector<std::string> WordFinder::wordsIn(std::string_view text)
 
 struct LocalizedSearch::Impl {
     icu::UnicodeString text;
-    std::unique_ptr<icu::RuleBasedCollator> collator; // null if ICU has none
+    std::unique_ptr<icu::RuleBasedCollator> collator; // null if ICU could not create one
 };
 
 LocalizedSearch::LocalizedSearch(std::string_view text, const std::string& locale)
@@ -142,7 +142,7 @@ LocalizedSearch::LocalizedSearch(std::string_view text, const std::string& local
     std::unique_ptr<icu::Collator> collator(icu::Collator::createInstance(localeOf(locale), status));
     if (U_FAILURE(status) || !dynamic_cast<icu::RuleBasedCollator*>(collator.get())) return;
     _impl->collator.reset(static_cast<icu::RuleBasedCollator*>(collator.release()));
-    _impl->collator->setStrength(icu::Collator::SECONDARY); // accents count, case doesn't
+    _impl->collator->setStrength(icu::Collator::SECONDARY); // compares accents, ignores case
 }
 
 LocalizedSearch::~LocalizedSearch() = default;
