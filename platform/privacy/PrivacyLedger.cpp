@@ -30,7 +30,7 @@ std::string digestOf(std::string_view text)
     return hexText(digest);
 }
 
-/// The debits in a value, which must be as the ledger keeps them.
+/// Reads the debits; returns false if they are out of range or out of order.
 bool readDebits(const Value& value, std::vector<PrivacyLedger::Debit>& debits)
 {
     if (!value.asArray()) return false;
@@ -46,7 +46,7 @@ bool readDebits(const Value& value, std::vector<PrivacyLedger::Debit>& debits)
     return true;
 }
 
-/// A ledger with debits has a time, which is not before the last of them.
+/// Reads the time; returns false if a debit is later than it, or if there are debits without a time.
 bool readTime(const Value& value, PrivacyLedger& ledger)
 {
     if (const std::string* text = value["time"].asString()) ledger.time = LivedTime::Mark::parse(*text);

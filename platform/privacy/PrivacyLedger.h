@@ -14,13 +14,13 @@
 
 namespace platform {
 
-/// How many reports a device has made in the last day, and the secret that hides their contents: a value, as it is kept
-/// on disk (docs/formats.md).
+/// The number of reports that this device made in the last day, and the secret that hides their contents. A plain
+/// value; docs/formats.md describes the file.
 ///
-/// The ledger counts lived time (`LivedTime`). So a clock that was set back brings no new budget, and a debit that was
-/// made while the clock ran years ahead doesn't use up the budget of those years.
+/// Times are lived time (`LivedTime`): setting the clock back brings no new budget, and a debit made while the clock
+/// was years ahead doesn't use up the budget of those years. One thread at a time.
 struct PrivacyLedger {
-    /// In any 24 hours of lived time.
+    /// The budget: reports in any 24 hours of lived time.
     static constexpr int kReportsADay = 8;
 
     struct Debit {
@@ -30,23 +30,24 @@ struct PrivacyLedger {
     };
 
     DeviceSecret secret{};
-    std::optional<LivedTime::Mark> time; ///< when it was last written; nothing before the first time
-    std::vector<Debit> debits;           ///< in order of time; those that no longer count may be missing
+    std::optional<LivedTime::Mark> time; ///< of the last write; empty before the first
+    std::vector<Debit> debits;           ///< in order of time; expired ones may be missing
 
-    /// Returns how many reports may still be made; never less than 0.
+    /// Returns how many reports may still be made at `lived`; at least 0.
     [[nodiscard]] int left(Duration lived) const;
-    /// Books reports. The caller has asked `left` first.
+    /// Books reports; doesn't check the budget.
     void debit(int reports, Duration lived);
 
-    /// The file's contents, with a digest that shows damage.
+    /// Returns the file's contents, with a SHA-256 digest that reveals damage.
     [[nodiscard]] std::string text() const;
-    /// Fails for anything that `text` didn't make.
+    /// Parses what `text` returned. Returns an error of domain "Format" for anything else.
     [[nodiscard]] static Result<PrivacyLedger> parse(std::string_view text);
 };
 
-/// Bytes as lower-case hexadecimal digits, and back. `readHex` returns false if the text isn't exactly that many bytes;
-/// `bytes` are undefined then.
+/// Returns the bytes as lower-case hexadecimal digits.
 [[nodiscard]] std::string hexText(std::span<const std::uint8_t> bytes);
+/// Reads lower-case hexadecimal digits. Returns false, and leaves `bytes` unspecified, for any other text and for one
+/// of another length.
 [[nodiscard]] bool readHex(std::string_view text, std::span<std::uint8_t> bytes);
 
 } // namespace platform

@@ -28,7 +28,7 @@ std::unexpected<Error> failure(std::int64_t code, std::string reason)
     return std::unexpected(Error::withReason(std::string(kPrivacyErrorDomain), code, std::move(reason)));
 }
 
-/// "2026-01-31", UTC. Such texts compare as the days do.
+/// Returns the UTC day as "2026-01-31". Such texts sort by day.
 std::string dayOf(Date date)
 {
     const std::chrono::year_month_day day(std::chrono::floor<std::chrono::days>(date));
@@ -53,11 +53,11 @@ PrivacyRecorder::PrivacyRecorder(FileSystem& files, Clock& clock, std::filesyste
     : _files(files), _clock(clock), _directory(std::move(directory)), _random(std::move(random))
 {}
 
-/// All the randomness of one call: nothing can run out of it halfway.
+/// The random numbers of one call, all drawn at its start: nothing can fail halfway for lack of them.
 struct PrivacyRecorder::Drawn {
     DeviceSecret newSecret{};
     std::array<PrivacyRandom, PrivacyLedger::kReportsADay> noise{};
-    std::vector<std::uint64_t> ranks; ///< one for each text; those of the lowest are recorded
+    std::vector<std::uint64_t> ranks; ///< one for each text; the texts with the lowest are recorded
 };
 
 Result<PrivacyRecorder::Drawn> PrivacyRecorder::draw(std::size_t texts) const
@@ -83,7 +83,7 @@ Result<std::size_t> PrivacyRecorder::record(std::string_view key, const std::set
     auto ledger = readLedger(drawn->newSecret);
     if (!ledger) return std::unexpected(std::move(ledger.error()));
     const LivedTime::Mark now = LivedTime(_clock, ledger->time).mark();
-    ledger->time = now; // written in any case, so that time goes on from a clock that was set back
+    ledger->time = now; // always written: lived time continues from here if the clock was set back
     const std::size_t count = std::min(texts.size(), static_cast<std::size_t>(ledger->left(now.lived)));
     if (count == 0) {
         if (auto written = writeLedger(*ledger); !written) return std::unexpected(std::move(written.error()));
@@ -125,9 +125,9 @@ Result<void> PrivacyRecorder::addReports(const std::vector<PrivacyReport>& repor
         if (earlier && earlier->asArray())
             all = *earlier->asArray();
         else
-            defaultLog().error("privacy reports in {} are broken and forgotten", path.string());
+            defaultLog().error("privacy reports in {} are damaged and will be replaced", path.string());
     } else if (bytes.error().code != ENOENT) {
-        defaultLog().error("privacy reports can't be read and are forgotten: {}", bytes.error().description());
+        defaultLog().error("privacy reports can't be read and will be replaced: {}", bytes.error().description());
     }
 
     const Date now = _clock.wallNow();
@@ -135,7 +135,7 @@ Result<void> PrivacyRecorder::addReports(const std::vector<PrivacyReport>& repor
                   [oldest = dayOf(now - kKeptFor)](const Value& report) { return textAt(report, "day") < oldest; });
     for (const PrivacyReport& report : reports)
         all.push_back(Dictionary{{"day", dayOf(now)}, {"cohort", report.cohort}, {"bits", hexText(report.bits)}});
-    // In an order that doesn't tell which was first.
+    // Sorted, so that the order of a day's reports doesn't reveal the order of events.
     std::ranges::sort(all, {},
                       [](const Value& report) { return std::pair(textAt(report, "day"), textAt(report, "bits")); });
     return _files.writeAtomically(path, toJson(all));

@@ -13,7 +13,7 @@ namespace {
 using Sha256 = std::array<std::uint8_t, 32>;
 using Sha512 = std::array<std::uint8_t, 64>;
 
-/// Without digests nothing could be hidden; they fail only where memory has run out.
+/// Aborts if OpenSSL can't compute the digest (it is out of memory): without it nothing would be hidden.
 Sha256 sha256(std::string_view message)
 {
     Sha256 digest{};
@@ -30,7 +30,7 @@ Sha512 hmacSha512(const DeviceSecret& secret, std::string_view message)
     return code;
 }
 
-/// No two pairs of key and text, and no two purposes, give the same message.
+/// Joins its arguments injectively: the key's length separates key and text.
 std::string message(char purpose, std::string_view key, std::string_view text)
 {
     std::string bytes(1, purpose);

@@ -7,42 +7,43 @@
 
 namespace platform {
 
-// Randomised response: a text is hashed to one bit of 256, and every bit is flipped at random, twice. docs/privacy.md
-// derives what that hides. Pure functions.
+// Randomised response: a text is hashed to one bit of 256 (a Bloom filter with one hash function), and every bit is
+// flipped at random, twice. docs/privacy.md derives the privacy loss. Pure functions; any thread.
 
-/// Bits by number: bit n is the nth, from the least significant of the first byte on.
+/// Bit n is bit n % 8 of byte n / 8, counted from the least significant.
 using PrivacyBits = std::array<std::uint8_t, 32>;
 inline constexpr unsigned kPrivacyBits = 256;
 inline constexpr unsigned kPrivacyCohorts = 8;
-/// The chance that each of the two responses flips a bit.
+/// The probability with which each of the two responses flips a bit.
 inline constexpr double kPrivacyFlip = 1.0 / 4;
 
-/// The chance that a report has its text's own bit set, and any other bit.
+/// The probability that a report has the bit of its text set, and the probability for any other bit.
 inline constexpr double kTrueBitRate = 5.0 / 8;
 inline constexpr double kOtherBitRate = 3.0 / 8;
-/// The most that is lost by one report of a text, 2 ln(5/3), and by any number of reports of that text, 2 ln 3.
+/// Upper bounds of the privacy loss of one report of a text, 2 ln(5/3), and of any number of reports of it, 2 ln 3.
 inline constexpr double kReportEpsilon = 1.0216512475319814;
 inline constexpr double kPermanentEpsilon = 2.1972245773362196;
 
-/// Known to the device alone.
+/// Never leaves the device.
 using DeviceSecret = std::array<std::uint8_t, 32>;
 /// Random bytes for one report.
 using PrivacyRandom = std::array<std::uint8_t, 64>;
 
-/// The group of devices that this one belongs to, for ever. In each group other texts share a bit.
+/// Returns the device's cohort, which never changes: 0 to `kPrivacyCohorts` - 1. Two texts that share a bit in one
+/// cohort rarely share one in another.
 [[nodiscard]] unsigned privacyCohort(const DeviceSecret& secret);
-/// The bit that stands for a text under a key. Anyone can compute it.
+/// Returns the number of the bit for a text under a key. It depends on nothing secret.
 [[nodiscard]] unsigned privacyBit(unsigned cohort, std::string_view key, std::string_view text);
-/// The bits that this device flips whenever it reports that text under that key: the permanent response.
+/// Returns the permanent response: the bits that this device flips in every report of that text under that key.
 [[nodiscard]] PrivacyBits permanentFlips(const DeviceSecret& secret, std::string_view key, std::string_view text);
-/// The bits that random bytes flip: the instantaneous response.
+/// Returns the instantaneous response: each bit is set with probability `kPrivacyFlip`.
 [[nodiscard]] PrivacyBits flips(std::span<const std::uint8_t, 64> random);
 
 struct PrivacyReport {
     unsigned cohort = 0;
     PrivacyBits bits{};
 };
-/// A report of a text, through both responses. `random` must not be used again.
+/// Returns a report of a text with both responses applied. `random` must not be used again.
 [[nodiscard]] PrivacyReport privatised(const DeviceSecret& secret, std::string_view key, std::string_view text,
                                        const PrivacyRandom& random);
 
