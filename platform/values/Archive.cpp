@@ -11,7 +11,7 @@
 #include "platform/values/Dictionary.h"
 #include "platform/values/Record.h"
 
-/// Archives: MessagePack. A record is a map whose first key is "class"; a date is a timestamp, the extension type -1.
+/// A record is a MessagePack map whose first key is "class"; a date is a timestamp, extension type -1.
 namespace platform {
 
 namespace {
@@ -26,7 +26,7 @@ class ArchiveEncoder final : public Encoder {
 public:
     void beginRecord(std::string_view className, std::size_t) override
     {
-        // A map with a count of 16 bits, which is known when the record ends.
+        // A map whose 16-bit count is filled in when the record ends.
         _records.push_back({.start = _stream.bytes.size(), .entries = 1});
         _stream.bytes.append("\xde\0\0", 3);
         packText(kClassKey);
@@ -46,7 +46,7 @@ public:
     }
     void beginArray(std::size_t count) override { _packer.pack_array(static_cast<std::uint32_t>(count)); }
     void endArray() override {}
-    /// A field that is null is left out: its key goes again.
+    /// Leaves out a null field: removes the key that was just written.
     void null() override
     {
         if (_stream.bytes.size() != _keyEnd) {
@@ -62,7 +62,7 @@ public:
     void unsignedInteger(std::uint64_t value) override { _packer.pack_uint64(value); }
     void real(double value) override
     {
-        // The packer would write a whole number as an integer, and the value would come back as another type.
+        // The packer would write a whole number as an integer, and the value would be read back as another type.
         std::array<char, 9> number{'\xcb'};
         store(number.data() + 1, std::bit_cast<std::uint64_t>(value));
         _stream.write(number.data(), number.size());
@@ -138,12 +138,12 @@ private:
     msgpack::packer<Stream> _packer{_stream};
     std::vector<OpenRecord> _records;
     std::size_t _keyStart = 0;
-    std::size_t _keyEnd = std::string::npos; ///< where the bytes end if a field's key was the last thing written
+    std::size_t _keyEnd = std::string::npos; ///< end of the last key; equals the size if nothing followed the key
 };
 
 // Reading
 
-/// One value of an archive, or the head of a container, whose contents follow it.
+/// One value of an archive, or the head of a container. The contents of a container follow as further tokens.
 struct Token {
     Value::Type type = Value::Type::Null;
     std::uint32_t size = 0; ///< bytes of a string or bytes; elements of an array; entries of a dictionary
@@ -156,14 +156,14 @@ struct Token {
     };
 
     [[nodiscard]] std::string_view text() const { return {bytes, size}; }
-    /// How many values follow that belong to this one.
+    /// Returns the number of values that a container declares; 0 for other types.
     [[nodiscard]] std::uint64_t contents() const
     {
         return type == Value::Type::Array ? size : type == Value::Type::Dictionary ? std::uint64_t{size} * 2 : 0;
     }
 };
 
-/// Big-endian number.
+/// Reads a big-endian number.
 template <std::unsigned_integral Number> Number load(const char* from)
 {
     Number number;
@@ -171,13 +171,13 @@ template <std::unsigned_integral Number> Number load(const char* from)
     return std::endian::native == std::endian::little ? std::byteswap(number) : number;
 }
 
-/// What the first byte of a value tells about the following ones.
+/// What the first byte of a value says about the bytes after it.
 struct Head {
     Value::Type type = Value::Type::Null;
     std::uint8_t width = 0; ///< bytes of the number or length after the first byte
     bool isSigned = false;
     bool isKnown = true;
-    std::uint32_t number = 0; ///< if the first byte contains it
+    std::uint32_t number = 0; ///< the number or length, if the first byte contains it
 };
 
 /// MessagePack's table of first bytes (https://msgpack.org).
@@ -210,8 +210,8 @@ constexpr auto kHeads = [] {
     return heads;
 }();
 
-/// Reads an archive value by value. The library's own parsers read it whole, into objects or for a visitor, so that
-/// what records ask for one by one would have to be kept first; that took a third of the time.
+/// Reads an archive value by value, as records ask for it. The library's parsers read the whole archive into objects or
+/// for a visitor first; storing that took a third of the decoding time.
 class ArchiveDecoder final : public Decoder {
 public:
     /// `archive` must outlive the decoder.
@@ -254,7 +254,7 @@ public:
     Bytes bytes() override { return Bytes(std::string(take(Value::Type::Bytes, "bytes").text())); }
     Date date() override { return Date(Duration(take(Value::Type::Date, "a date").integer)); }
     Value value() override { return value(kMaximumDepth); }
-    /// Reads the next value, in which arrays and dictionaries may nest `levels` deep.
+    /// Reads the next value. Fails if its arrays and dictionaries nest deeper than `levels`.
     Value value(std::size_t levels)
     {
         const Token token = here();
@@ -334,7 +334,7 @@ public:
     bool nextKey(std::string_view& name) override
     {
         if (!nextElement()) return false;
-        if (takeShortText(name)) return true; // as nearly every key is
+        if (takeShortText(name)) return true; // nearly every key is short
         name = take(Value::Type::String, "a key").text();
         return !failed();
     }
@@ -365,7 +365,7 @@ private:
         return _here;
     }
 
-    /// Returns the next token, which must be of that type; an empty one after a failure.
+    /// Consumes and returns the next token. Fails if it is not of that type; returns an empty token after a failure.
     Token take(Value::Type type, std::string_view expected)
     {
         const Token& token = here();
@@ -377,7 +377,8 @@ private:
         return token;
     }
 
-    /// Takes what comes next if it is a text whose length is in its first byte; false leaves it.
+    /// If the next value is a text whose length is in its first byte, consumes it and returns true; otherwise consumes
+    /// nothing.
     bool takeShortText(std::string_view& text)
     {
         if (_isRead || _next == _end) return false;
@@ -394,7 +395,7 @@ private:
         if (_next == _end) return fail("truncated");
         const Head& head = kHeads[static_cast<unsigned char>(*_next++)];
         if (head.width > _end - _next) return fail("truncated");
-        const std::uint64_t number = numberBehind(head);
+        const std::uint64_t number = numberAfter(head);
         _next += head.width;
         _here = {.type = head.type};
         switch (head.type) {
@@ -411,7 +412,7 @@ private:
             _here.real = head.width == 4 ? double{std::bit_cast<float>(static_cast<std::uint32_t>(number))}
                                          : std::bit_cast<double>(number);
             return;
-        case Value::Type::Date: ++_next; [[fallthrough]]; // the type of the extension
+        case Value::Type::Date: ++_next; [[fallthrough]]; // skips the extension type
         case Value::Type::String:
         case Value::Type::Bytes:
             if (_next > _end || number > static_cast<std::uint64_t>(_end - _next)) return fail("truncated");
@@ -423,15 +424,15 @@ private:
         case Value::Type::Array:
         case Value::Type::Dictionary:
             _here.size = static_cast<std::uint32_t>(number);
-            // Every value takes at least one byte: all containers together can't declare more values than bytes.
+            // Every value takes at least one byte, so all containers together can't declare more values than bytes.
             if (_here.contents() > _valuesLeft) return fail("truncated");
             _valuesLeft -= _here.contents();
             return;
         }
     }
 
-    /// Returns the number after the first byte, sign-extended if it is signed, or the one in the first byte.
-    [[nodiscard]] std::uint64_t numberBehind(const Head& head) const
+    /// Returns the number that follows the first byte, sign-extended if it is signed, or the number in the first byte.
+    [[nodiscard]] std::uint64_t numberAfter(const Head& head) const
     {
         const auto signedAs = [&head](auto number) -> std::uint64_t {
             using Signed = std::make_signed_t<decltype(number)>;
@@ -470,7 +471,7 @@ private:
         _here.integer = static_cast<std::int64_t>(total);
     }
 
-    /// Enters a container of `size` elements or fields.
+    /// Opens a container of `size` elements or fields.
     void enter(std::uint32_t size)
     {
         if (_left.size() == kMaximumDepth) fail("nested too deep");
@@ -479,7 +480,7 @@ private:
 
     const char* _next;
     const char* const _end;
-    std::uint64_t _valuesLeft; ///< that containers may still declare
+    std::uint64_t _valuesLeft; ///< how many values containers may still declare
     Token _here;
     bool _isRead = false;             ///< `_here` is the next value, and `_next` is after it
     std::vector<std::uint32_t> _left; ///< values left in each open container
@@ -514,7 +515,7 @@ Result<Value> valueFromArchive(std::string_view bytes)
 {
     static const RecordClasses kNone;
     ArchiveDecoder decoder(bytes, kNone);
-    Value value = decoder.value(2 * kMaximumDepth); // records that nest, and a value in the innermost
+    Value value = decoder.value(2 * kMaximumDepth); // nested records, and a nested value in the innermost one
     decoder.finish();
     if (auto error = decoder.error()) return std::unexpected(std::move(*error));
     return value;

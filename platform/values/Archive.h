@@ -8,17 +8,18 @@
 
 namespace platform {
 
-/// Encodes a record as a MessagePack archive, the form that is stored. Null fields are left out. Any thread, like all
-/// of these.
+// Archives are MessagePack, the form that files store (docs/formats.md). Any thread.
+
+/// Encodes a record. Null fields are left out.
 [[nodiscard]] std::string archive(const Record& record);
-/// Decodes a record of one of the classes. Trailing bytes are an error. Declared lengths are checked against the bytes
-/// at hand before memory is reserved.
+/// Decodes a record of one of `classes`. Returns an error of domain "Format" for bytes that are not such a record and
+/// for trailing bytes. Checks declared lengths against the input's size before it reserves memory.
 [[nodiscard]] Result<std::shared_ptr<Record>> unarchive(std::string_view bytes, const RecordClasses& classes);
 
-/// Encodes a plain value as an archive.
+/// Encodes a plain value.
 [[nodiscard]] std::string archiveValue(const Value& value);
-/// Decodes an archive into plain values. A record of any class becomes a dictionary with its class under "class". The
-/// limits are those of `unarchive`.
+/// Decodes an archive into plain values. A record of any class becomes a dictionary with its class name under "class".
+/// Errors and limits are those of `unarchive`.
 [[nodiscard]] Result<Value> valueFromArchive(std::string_view bytes);
 
 } // namespace platform

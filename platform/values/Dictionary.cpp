@@ -11,7 +11,7 @@ namespace platform {
 
 namespace {
 
-/// Up to this many entries, comparing keys one by one is as fast as hashing.
+/// Up to this many entries, a linear search is as fast as hashing.
 constexpr std::size_t kLinearLimit = 8;
 
 struct HashKey {
@@ -27,7 +27,7 @@ HashKey randomHashKey()
     return {k0, word()};
 }
 
-/// SipHash-1-3 under a random key of this process, so that nobody outside can choose keys that collide.
+/// SipHash-1-3, keyed with a random number of this process: an attacker can't choose keys that collide.
 std::uint64_t hashOf(std::string_view text)
 {
     static const HashKey key = randomHashKey();
@@ -60,7 +60,7 @@ std::uint64_t hashOf(std::string_view text)
 
 } // namespace
 
-/// An open-addressed table of positions in the entries, at most half full.
+/// An open-addressing hash table of positions in the entries, at most half full.
 struct Dictionary::Index {
     struct Slot {
         std::uint32_t position = kFree;
@@ -121,7 +121,7 @@ Dictionary& Dictionary::operator=(const Dictionary& other)
 
 Dictionary& Dictionary::operator=(Dictionary&& other) noexcept
 {
-    // What this dictionary held is destroyed last: `other` may be part of it.
+    // Destroys the old contents last: `other` may be part of them.
     Dictionary taken(std::move(other));
     _entries.swap(taken._entries);
     _index.swap(taken._index);

@@ -14,8 +14,9 @@ namespace platform {
 
 /// Maps strings to values, in the order in which the keys were first set.
 ///
-/// A few entries are searched one by one, more of them by a hash that a document can't be made to collide: a hostile
-/// one of a million keys costs no more than its length. A dictionary may be read by many threads, or written by one.
+/// Small dictionaries are searched linearly, larger ones through a hash table. The hash is keyed with a random number
+/// of the process, so that a hostile document can't choose keys that collide. Many threads may read a dictionary, or
+/// one may write it.
 class Dictionary {
 public:
     using Entry = std::pair<std::string, Value>;
@@ -28,12 +29,12 @@ public:
     Dictionary& operator=(Dictionary&&) noexcept;
     ~Dictionary();
 
-    /// Returns the value of a key, or null. Valid until the dictionary is changed.
+    /// Returns the value of a key, or null if the key is missing. Valid until the dictionary is changed.
     [[nodiscard]] const Value* find(std::string_view key) const;
     [[nodiscard]] bool contains(std::string_view key) const { return find(key) != nullptr; }
     /// Sets the value of a key. An existing key keeps its place.
     void set(std::string key, Value value);
-    /// Returns true if the key existed. Takes time proportional to the size.
+    /// Removes a key and returns true, or returns false if the key is missing. Takes time proportional to the size.
     bool remove(std::string_view key);
     void reserve(std::size_t count);
 
@@ -42,7 +43,7 @@ public:
     [[nodiscard]] auto begin() const { return _entries.begin(); }
     [[nodiscard]] auto end() const { return _entries.end(); }
 
-    /// Regardless of order.
+    /// Ignores the order of entries.
     friend bool operator==(const Dictionary& a, const Dictionary& b);
 
 private:
@@ -50,7 +51,7 @@ private:
     [[nodiscard]] std::optional<std::size_t> positionOf(std::string_view key) const;
 
     std::vector<Entry> _entries;
-    std::unique_ptr<Index> _index; // made when the dictionary grows past the linear limit
+    std::unique_ptr<Index> _index; // null while the dictionary is small
 };
 
 } // namespace platform

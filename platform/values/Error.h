@@ -10,8 +10,8 @@
 
 namespace platform {
 
-/// Why something failed: a code, the domain that defines it, and details under string keys. The details hold a short
-/// text under "reason" if its maker had one.
+/// Why something failed: a code, the domain that defines the code, and details under string keys. The key "reason" has
+/// a short text, if there is one. A plain value: any thread may use a copy.
 struct Error {
     std::string domain;
     std::int64_t code = 0;
@@ -23,12 +23,12 @@ struct Error {
         : domain(std::move(domain_)), code(code_), userInfo(std::move(userInfo_))
     {}
 
-    /// An error with a "reason".
+    /// Returns an error with `reason` under "reason".
     static Error withReason(std::string domain, std::int64_t code, std::string reason);
-    /// The error of a system call: domain "POSIX", code `errnum`. The reason is the system's text after `what`.
+    /// Returns the error of a system call: domain "POSIX", code `errnum`, reason "WHAT: TEXT" with the system's text.
     static Error posix(int errnum, std::string_view what = {});
 
-    /// The text under "reason", or the empty string.
+    /// Returns the text under "reason", or the empty string.
     [[nodiscard]] std::string reason() const;
     /// Returns "domain code: reason", for logs.
     [[nodiscard]] std::string description() const;
@@ -41,13 +41,13 @@ struct Error {
 
 template <class T> using Result = std::expected<T, Error>;
 
-/// The domain of errors of readers: JSON, property lists, archives, IPC messages.
+/// The domain of parsing errors: JSON, property lists, archives, IPC messages.
 inline constexpr std::string_view kFormatErrorDomain = "Format";
-/// Its code for input that is not of the format or exceeds a limit.
+/// Code: the input is not of the format or exceeds a limit.
 inline constexpr std::int64_t kFormatMalformed = 1;
-/// Its code for a record of a class that the reader doesn't know.
+/// Code: a record is of a class that the reader doesn't know.
 inline constexpr std::int64_t kFormatUnknownClass = 2;
-/// The domain of system call errors, whose codes are `errno` values.
+/// The domain of system call errors. Codes are `errno` values.
 inline constexpr std::string_view kPosixErrorDomain = "POSIX";
 
 } // namespace platform

@@ -23,10 +23,9 @@ namespace {
 
 namespace dom = simdjson::dom;
 
-/// A thread keeps a parser for documents up to this size; it needs some 15 bytes of memory for each of them.
+/// Each thread reuses a parser whose capacity is at most this; a parser takes about 15 times its capacity in memory.
 constexpr std::size_t kKeptParserCapacity = 64u << 10;
 
-/// The parser that this thread has kept.
 thread_local std::unique_ptr<dom::parser> keptParser;
 
 std::unexpected<Error> malformed(std::string reason)
@@ -34,7 +33,7 @@ std::unexpected<Error> malformed(std::string reason)
     return std::unexpected(Error::withReason(std::string(kFormatErrorDomain), kFormatMalformed, std::move(reason)));
 }
 
-/// Counts levels, unlike the parser, which leaves out containers that are empty.
+/// Returns true if containers nest deeper than `levels`. Unlike the parser, counts empty containers too.
 bool nestsDeeper(dom::element element, std::size_t levels)
 {
     if (dom::array array; element.get(array) == simdjson::SUCCESS)
@@ -48,20 +47,22 @@ bool nestsDeeper(dom::element element, std::size_t levels)
 
 simdjson::error_code parseBounded(dom::parser& parser, std::string_view text, dom::element& root)
 {
-    // Documents of so few levels that an empty container is no level too many; nearly every one is.
+    // The parser doesn't count empty containers. With this limit no document nests too deep even with an empty
+    // container in the innermost level; nearly every document passes.
     if (parser.max_depth() != kMaximumDepth)
         if (const auto error = parser.allocate(parser.capacity(), kMaximumDepth)) return error;
     auto error = parser.parse(text.data(), text.size()).get(root);
     if (error != simdjson::DEPTH_ERROR) return error;
 
+    // With one level more, the levels are counted here.
     error = parser.allocate(parser.capacity(), kMaximumDepth + 1);
     if (!error) error = parser.parse(text.data(), text.size()).get(root);
     return !error && nestsDeeper(root, kMaximumDepth) ? simdjson::DEPTH_ERROR : error;
 }
 
-// What a browser reads and the parser refuses
+// Numbers and escapes that a browser accepts and the parser refuses
 
-/// The length of the number that the text begins with; 0 if that is not a number of JSON.
+/// Returns the length of the number that the text begins with; 0 if it doesn't begin with a JSON number.
 std::size_t numberLength(std::string_view text)
 {
     std::size_t at = text.starts_with('-') ? 1 : 0;
@@ -84,7 +85,7 @@ std::size_t numberLength(std::string_view text)
     return digits() == 0 ? 0 : at;
 }
 
-/// A number as the parser can read it: integers beyond 64 bits as doubles, numbers beyond a double as the largest one.
+/// Rewrites a number for the parser: integers beyond 64 bits as doubles, numbers beyond a double as the largest one.
 std::string readableNumber(const std::string& text)
 {
     const auto reads = [&]<class Integer>(Integer number) {
@@ -103,7 +104,7 @@ std::string readableNumber(const std::string& text)
     return {digits.begin(), result.ptr};
 }
 
-/// The code unit of an escape "\uXXXX" that the text begins with.
+/// Returns the code unit of the escape "\uXXXX" that the text begins with, or nothing.
 std::optional<unsigned> escapedUnit(std::string_view text)
 {
     constexpr std::size_t kLength = 6;
@@ -113,7 +114,7 @@ std::optional<unsigned> escapedUnit(std::string_view text)
     return error == std::errc() && end == text.data() + kLength ? std::optional(unit) : std::nullopt;
 }
 
-/// Replaces the numbers and escapes that the parser refuses although a browser reads them. Keeps everything else.
+/// Replaces the numbers and escapes that a browser accepts and the parser refuses. Keeps everything else.
 std::string mended(std::string_view text)
 {
     std::string result;
@@ -178,7 +179,7 @@ Value convert(dom::element element)
 
 // Writing
 
-/// What a byte of a string needs.
+/// How a byte of a string is escaped.
 enum class Escape : std::uint8_t { None, Short, Unicode };
 
 constexpr auto kEscapes = [] {
@@ -200,7 +201,7 @@ constexpr char shortEscape(char c)
     }
 }
 
-/// `text` with U+FFFD in place of each byte that is no part of valid UTF-8.
+/// Replaces each byte that is not part of valid UTF-8 by U+FFFD.
 std::string repaired(std::string_view text)
 {
     std::string valid;
@@ -220,14 +221,14 @@ std::string repaired(std::string_view text)
     return valid;
 }
 
-/// Collects the text.
+/// Stores the text.
 struct TextSink {
     std::string text;
     void put(char c) { text += c; }
     void put(std::string_view part) { text += part; }
 };
 
-/// Counts its bytes only.
+/// Counts the bytes.
 struct CountingSink {
     std::size_t count = 0;
     void put(char) { ++count; }
@@ -264,7 +265,7 @@ private:
 
     void writeReal(double number)
     {
-        // Without an exponent these would be read as integers that are out of range, and "-0" as a plain zero.
+        // Readers take large doubles without an exponent for integers out of range, and "-0" for an integer zero.
         constexpr double kIntegerLimit = 9223372036854775808.0;
         if (!std::isfinite(number))
             _sink.put("null");
@@ -363,7 +364,7 @@ private:
 } // namespace
 
 struct JsonDocument::Parsed {
-    std::unique_ptr<dom::parser> parser; ///< holds the document
+    std::unique_ptr<dom::parser> parser; ///< owns the document
     dom::element root;
 
     Parsed() : parser(keptParser ? std::move(keptParser) : std::make_unique<dom::parser>()) {}
@@ -374,14 +375,14 @@ struct JsonDocument::Parsed {
     Parsed(const Parsed&) = delete;
     Parsed& operator=(const Parsed&) = delete;
 
-    /// Nothing if the document is no array.
+    /// Returns nothing if the document is not an array.
     [[nodiscard]] std::optional<dom::array> elements() const
     {
         dom::array array;
         return root.get(array) == simdjson::SUCCESS ? std::optional(array) : std::nullopt;
     }
 
-    /// The entry of the document's dictionary, if it is a T.
+    /// Returns the last entry `wanted` of the document if it is a T; nothing otherwise.
     template <class T> [[nodiscard]] std::optional<T> entry(std::string_view wanted) const
     {
         std::optional<dom::element> last;

@@ -14,13 +14,13 @@
 #include "platform/values/Error.h"
 #include "platform/values/Value.h"
 
-/// Binary property lists are written by libplist. They are read here, because that library recurses as deep as a
-/// file nests and copies an object for every reference to it: a file of a kilobyte could take all memory.
+/// libplist writes property lists. It doesn't read them: it recurses as deep as a file nests and copies an object for
+/// every reference to it, so that a file of one kilobyte could exhaust memory.
 namespace platform {
 
 namespace {
 
-/// Property list dates count from 2001-01-01 00:00 UTC; this is that moment, in seconds since 1970.
+/// 2001-01-01 00:00 UTC, from which property list dates count, in seconds since 1970.
 constexpr std::int64_t kEpoch = 978307200;
 
 std::unexpected<Error> malformed(std::string reason)
@@ -30,7 +30,7 @@ std::unexpected<Error> malformed(std::string reason)
 
 // Reading
 
-/// Reads one file:
+/// Parses one file:
 ///
 ///     "bplist00" | objects | offset of each object | trailer
 ///
@@ -74,14 +74,14 @@ private:
         return false;
     }
 
-    /// `count` bytes at `position`, if they are there.
+    /// Returns `count` bytes at `position`, or nothing if the file is too short.
     [[nodiscard]] std::optional<std::string_view> bytes(std::uint64_t position, std::uint64_t count) const
     {
         if (position > _file.size() || count > _file.size() - position) return std::nullopt;
         return _file.substr(position, count);
     }
 
-    /// The big-endian number of `width` bytes, at most 8, at `position`.
+    /// Returns the big-endian number of `width` bytes (at most 8) at `position`, or nothing if the file is too short.
     [[nodiscard]] std::optional<std::uint64_t> number(std::uint64_t position, std::uint64_t width) const
     {
         const auto digits = bytes(position, width);
@@ -91,7 +91,7 @@ private:
         return value;
     }
 
-    /// Reads object `index`, which lies `depth` containers deep.
+    /// Reads object `index`, which is nested in `depth` containers.
     bool readObject(std::uint64_t index, std::size_t depth, Value& value)
     {
         if (index >= _objectCount) return fail("reference to no object");
@@ -127,7 +127,7 @@ private:
         return true;
     }
 
-    /// Integers of 8 bytes are signed, shorter ones are not, and of 16 bytes the upper half must be the sign.
+    /// Integers of 8 bytes are signed, shorter ones unsigned. The upper half of a 16-byte integer must be its sign.
     bool readInteger(std::uint64_t position, unsigned exponent, Value& value)
     {
         if (exponent > 4) return fail("integer of an unsupported width");
@@ -170,13 +170,14 @@ private:
     {
         const auto seconds = exponent == 3 ? real(position, exponent) : std::nullopt;
         if (!seconds || !std::isfinite(*seconds)) return fail("broken date");
-        // Whole seconds and the rest apart, so that the shift of the epoch costs no precision.
+        // Shifts whole seconds only: the fraction keeps its precision.
         const double whole = std::floor(*seconds);
         value = dateFromSecondsSince1970(whole + static_cast<double>(kEpoch)) + durationFromSeconds(*seconds - whole);
         return true;
     }
 
-    /// The length of an object: the low half of its marker, or an integer object after it. Moves `position` past it.
+    /// Reads the length of an object: the low half of its marker, or the integer object that follows the marker. Moves
+    /// `position` past it.
     bool readLength(std::uint64_t& position, unsigned low, std::uint64_t& length)
     {
         length = low;
@@ -191,7 +192,7 @@ private:
         return true;
     }
 
-    /// Data (type 4), an ASCII string (5) or a UTF-16 string (6).
+    /// Reads data (type 4), an ASCII string (5) or a UTF-16 string (6).
     bool readRun(std::uint64_t type, std::uint64_t position, unsigned low, Value& value)
     {
         std::uint64_t length = 0;
@@ -223,7 +224,7 @@ private:
         return text;
     }
 
-    /// Reads the head of a container that lies `depth` deep and has `width` references for each of its `length` items.
+    /// Reads the head of a container at nesting `depth` that has `width` references for each of its `length` items.
     /// Moves `position` to the references.
     bool readHead(std::uint64_t& position, unsigned low, std::size_t depth, unsigned width, std::uint64_t& length)
     {
@@ -250,7 +251,7 @@ private:
         return true;
     }
 
-    /// References to all keys, then to all values.
+    /// Reads a dictionary: references to all keys, then to all values.
     bool readDictionary(std::uint64_t position, unsigned low, std::size_t depth, Value& value)
     {
         std::uint64_t length = 0;
@@ -269,9 +270,10 @@ private:
     }
 
     const std::string_view _file;
-    /// A reference takes at least a byte, so only a file that shares containers expands to more objects than this.
+    /// Starts at the file's size: a reference takes at least a byte, so only a file that refers to a container more
+    /// than once expands to more objects.
     std::uint64_t _objectsLeft;
-    std::uint64_t _bytesLeft; ///< of texts and data, which may be shared
+    std::uint64_t _bytesLeft; ///< limit of the texts and data, which may be referred to more than once
     std::uint64_t _offsetWidth = 0;
     std::uint64_t _referenceWidth = 0;
     std::uint64_t _objectCount = 0;
@@ -286,11 +288,11 @@ struct NodeDeleter {
 };
 using Node = std::unique_ptr<void, NodeDeleter>;
 
-/// Makes libplist's tree of a value. Its texts end at a NUL or broken UTF-8 and its dates are 32-bit seconds, so what
-/// would be cut short is refused.
+/// Converts a value to libplist's tree. libplist cuts texts at a NUL or invalid UTF-8 and has dates of 32-bit seconds;
+/// values that it would truncate fail.
 class NodeMaker {
 public:
-    /// Null after a failure, and for the null value, which the format doesn't have.
+    /// Returns null after a failure, and for the null value, which the format doesn't have.
     Node make(const Value& value, std::size_t depth = 0)
     {
         switch (value.type()) {
@@ -330,7 +332,7 @@ private:
         using namespace std::chrono;
         const auto whole = floor<seconds>(date.time_since_epoch()) - seconds(kEpoch);
         if (whole.count() < INT32_MIN || whole.count() >= INT32_MAX) return fail("a date out of range");
-        // Rounded, for a date that was read is a double, which may lie just below the microsecond that was written.
+        // Rounded: a date that was parsed from a double may be just below the microsecond that was written.
         const auto rounded = round<microseconds>(date.time_since_epoch()) - seconds(kEpoch);
         const auto count = floor<seconds>(rounded);
         return Node(plist_new_date(static_cast<std::int32_t>(count.count()),

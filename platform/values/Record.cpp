@@ -25,7 +25,7 @@ std::string_view withArticle(Value::Type type)
     return "";
 }
 
-/// Reads the fields of the record that was just entered.
+/// Reads the fields of the record that `beginRecord` entered.
 void decodeFields(Decoder& decoder, Record& record)
 {
     std::string_view key;
@@ -44,7 +44,7 @@ Value valueFromError(const Error& error)
     return dictionary;
 }
 
-/// Nothing if an entry is of the wrong type. Missing ones read as empty.
+/// Returns nothing if an entry is of the wrong type. Missing entries read as empty.
 std::optional<Error> errorFromValue(const Value& value)
 {
     const Value& domain = value["domain"];

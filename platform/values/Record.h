@@ -17,7 +17,7 @@
 #include "platform/values/Error.h"
 #include "platform/values/Value.h"
 
-/// Records are plain structs that list their fields once. Archives, IPC messages and tests work from that list.
+/// Records are plain structs that list their fields once. Archives, IPC messages and tests use that list.
 ///
 ///     struct Suggestion : platform::RecordOf<Suggestion> {
 ///         static constexpr std::string_view kClass = "Suggestion";
@@ -30,14 +30,14 @@
 ///         }
 ///     };
 ///
-/// A field is a bool, a whole number, an enumeration, a floating-point number, std::string, Uuid, Url, Bytes, Date,
-/// Value, Error, a shared_ptr to a record, or an optional or vector of these.
+/// A field is a bool, an integer, an enumeration, a floating-point number, std::string, Uuid, Url, Bytes, Date, Value,
+/// Error, a shared_ptr to a record, or an optional or vector of these.
 ///
-/// Decoding checks classes. A value of the wrong type, an unknown class, a record of a class other than the field's,
-/// and a null in an array of records are errors that name the field. Unknown keys are skipped; a missing key leaves its
-/// field as it was constructed.
+/// Decoding checks types. A value of the wrong type, an unknown class, a record of a class other than the field's, and
+/// a null in an array of records are errors that name the field. Unknown keys are skipped; the field of a missing key
+/// keeps its initial value.
 ///
-/// A record, an encoder or a decoder belongs to one thread at a time.
+/// Records, encoders and decoders: one thread at a time.
 namespace platform {
 
 /// Receives the values of one record, in the order in which the record lists its fields.
@@ -62,10 +62,11 @@ public:
 
 class RecordClasses;
 
-/// Reads values back. Each read consumes the next value. The first failure sticks: later reads return zero, so that
-/// callers check once, at the end.
+/// Reads the values of a record. Each read consumes the next value and fails if it is of another type. After the first
+/// failure all reads return zero or an empty value, so that callers check once, at the end.
 class Decoder {
 public:
+    /// `classes` must outlive the decoder.
     explicit Decoder(const RecordClasses& classes) : _classes(classes) {}
     virtual ~Decoder() = default;
 
@@ -80,29 +81,31 @@ public:
     virtual Date date() = 0;
     virtual Value value() = 0;
     virtual void skip() = 0;
-    /// Returns true if the next value is a record, and consumes nothing. A dictionary without a class is no record.
+    /// Returns true if the next value is a record; a dictionary without a class is not one. Consumes nothing.
     virtual bool isRecord() = 0;
-    /// Enters a record and returns its class name, which is valid as long as the input. `nextKey` moves from key to key
-    /// and leaves the record at its end.
+    /// Enters a record and returns its class name, which is valid as long as the input. Call `nextKey` until it returns
+    /// false.
     virtual std::string_view beginRecord() = 0;
-    /// Returns false at the end of the record, which it leaves. `name` is valid as long as the input.
+    /// Moves to the next field and sets `name`, which is valid as long as the input. At the end, leaves the record and
+    /// returns false.
     virtual bool nextKey(std::string_view& name) = 0;
-    /// Enters an array and returns an upper bound of its elements for which memory may be reserved.
+    /// Enters an array and returns an upper bound of its size for which memory may safely be reserved. Call
+    /// `nextElement` until it returns false.
     virtual std::size_t beginArray() = 0;
-    /// Returns false at the end of the array, which it leaves.
+    /// Moves to the next element. At the end, leaves the array and returns false.
     virtual bool nextElement() = 0;
 
-    /// Records a failure, unless there was one before.
+    /// Records the first failure; ignores later ones.
     void fail(std::string reason, std::int64_t code = kMalformed);
     [[nodiscard]] bool failed() const { return _failure.has_value(); }
-    /// Tells in which field or element a failure happened; called by each reader on the way out, innermost first.
+    /// Prepends a field or an index to the path of the failure. Each caller calls it on the way out, innermost first.
     void failedIn(std::string_view field);
     void failedIn(std::size_t index);
-    /// The failure, or nothing. Its reason begins with the path to the field: "results[2].score: expected a double, …".
+    /// Returns the failure, or nothing. Its reason begins with the path: "results[2].score: expected a double, …".
     [[nodiscard]] std::optional<Error> error() const;
     [[nodiscard]] const RecordClasses& classes() const { return _classes; }
 
-    /// Codes in kFormatErrorDomain.
+    /// Codes of kFormatErrorDomain.
     static constexpr std::int64_t kMalformed = kFormatMalformed;
     static constexpr std::int64_t kUnknownClass = kFormatUnknownClass;
 
@@ -112,7 +115,7 @@ protected:
 
 private:
     struct Failure {
-        std::string place; ///< path to the value, as far as it is known
+        std::string place; ///< path to the value, built from its end
         std::string reason;
         std::int64_t code;
     };
@@ -120,15 +123,16 @@ private:
     std::optional<Failure> _failure;
 };
 
-/// Base of every record.
+/// Base of every record. Derive from `RecordOf`, which implements these functions.
 class Record {
 public:
     virtual ~Record() = default;
     [[nodiscard]] virtual std::string_view className() const = 0;
     [[nodiscard]] virtual std::size_t fieldCount() const { return 0; }
     virtual void encodeFields(Encoder&) const {}
-    /// Reads the value of `key`. Returns false, and consumes nothing, if the record has no such field. Fields are
-    /// usually in the order of the list: the search begins at index `next`, which is set to that after the field found.
+    /// Reads the value of `key`; returns false and consumes nothing if the record has no such field. Fields usually
+    /// come in the order of the list, so the search begins at index `next`, which is set to the one after the field
+    /// found.
     virtual bool decodeField(std::string_view key, Decoder& decoder, std::size_t& next);
 
 protected:
@@ -137,7 +141,7 @@ protected:
         std::string_view name;
         void (*read)(Record&, Decoder&);
     };
-    /// All fields in the order of the lists, the base's first.
+    /// Returns all fields in order, those of the base first.
     [[nodiscard]] virtual std::span<const FieldReader> fieldReaders() const { return {}; }
 };
 
@@ -150,7 +154,7 @@ template <class Owner, class Member> constexpr Field<Owner, Member> field(std::s
     return {name, member};
 }
 
-/// The record classes that a reader accepts, by name. Immutable once filled: any thread.
+/// The record classes that a decoder accepts, by name. Fill it on one thread; then any thread may read it.
 class RecordClasses {
 public:
     using Factory = std::shared_ptr<Record> (*)();
@@ -180,18 +184,18 @@ private:
 
 void encodeRecord(Encoder& encoder, const Record& record);
 
-/// Reads a record of any known class. Returns null after a failure.
+/// Reads a record of any known class. Returns null after a failure; an unknown class is one.
 [[nodiscard]] std::shared_ptr<Record> decodeRecord(Decoder& decoder);
-/// Reads the next record if its class is known and `wanted`, which is asked about a fresh record. Skips anything else
-/// and returns null, which is no failure.
+/// Reads the next value if it is a record of a known class and `wanted`, called with an empty record of that class,
+/// returns true. Otherwise skips the value and returns null; that is not a failure.
 [[nodiscard]] std::shared_ptr<Record> decodeRecordIf(Decoder& decoder, bool (*wanted)(const Record&));
-/// Likewise for records that are a `T`.
+/// Likewise for the class `T` and classes derived from it.
 template <class T> [[nodiscard]] std::shared_ptr<T> decodeRecordIfA(Decoder& decoder)
 {
     const auto isA = [](const Record& record) { return dynamic_cast<const T*>(&record) != nullptr; };
     return std::dynamic_pointer_cast<T>(decodeRecordIf(decoder, isA));
 }
-/// Reads the next record, which must be of the class of `record`, into it.
+/// Reads the next record into `record`; fails if it is of another class.
 void decodeRecordInto(Decoder& decoder, Record& record);
 
 namespace detail {
@@ -308,7 +312,7 @@ template <class T> void decodeValue(Decoder& decoder, T& value)
 
 } // namespace detail
 
-/// The base of a record `Self` that extends the record `Base`; see the top of this file.
+/// Base of a record `Self` that adds fields to the record `Base`; see the top of this file.
 template <class Self, class Base = Record> class RecordOf : public Base {
 public:
     using Base::Base;
@@ -351,7 +355,7 @@ private:
     }
 };
 
-/// Returns the decoded record as a `T`; an error if it is of another class.
+/// Casts a decoded record to `T`; returns an error if it is of another class. Passes an error on.
 template <class T> [[nodiscard]] Result<std::shared_ptr<T>> castRecord(Result<std::shared_ptr<Record>> record)
 {
     if (!record) return std::unexpected(std::move(record.error()));

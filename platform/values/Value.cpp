@@ -10,23 +10,23 @@ namespace {
 
 constinit const Value kNull;
 
-/// Destroying a value destroys what it holds, level by level on the stack. Containers below this many levels wait in
-/// a list instead, so that no depth of nesting exhausts the stack.
+/// Destroying a container recurses into its contents. Containers nested deeper than this are put on a list and
+/// destroyed later, so that no depth of nesting exhausts the stack.
 constexpr unsigned kMaximumNestedDestruction = 128;
 constinit thread_local unsigned nestedDestructions = 0;
 constinit thread_local std::vector<Value>* waitingForDestruction = nullptr;
 
-/// Makes `shared` the only holder of its contents, copying them if there are others.
+/// Makes `shared` the only owner of its contents: copies them if there are other owners.
 template <class T> T& makeUnique(std::shared_ptr<T>& shared)
 {
     if (shared.use_count() > 1) shared = std::make_shared<T>(*shared);
-    // Counting once more orders our writes after the reads of a holder on another thread that has just let go.
+    // The increment orders our writes after the reads of another thread that has just released its reference.
     else
         const std::shared_ptr<T> ordered(shared);
     return *shared;
 }
 
-/// The whole number that `d` is, if an `I` can hold it: at least `lowest` and less than `limit`.
+/// Returns `d` as an `I` if it is a whole number, at least `lowest` and less than `limit`.
 template <class I> std::optional<I> wholeNumber(double d, double lowest, double limit)
 {
     if (!(d >= lowest && d < limit)) return std::nullopt;
@@ -52,7 +52,7 @@ Value& Value::operator=(const Value& other)
 
 Value& Value::operator=(Value&& other) noexcept
 {
-    // What this value held is destroyed last: `other` may be part of it.
+    // Destroys the old contents last: `other` may be part of them.
     Value taken(std::move(other));
     _storage.swap(taken._storage);
     return *this;
@@ -179,7 +179,7 @@ Dictionary& Value::mutableDictionary()
 
 bool operator==(const Value& a, const Value& b)
 {
-    // Numbers that fit are kept signed, so a signed and an unsigned one are never equal.
+    // Numbers that fit are stored as signed, so a signed and an unsigned one are never equal.
     if (a._storage.index() != b._storage.index()) return false;
     return std::visit(
         [&b]<class T>(const T& mine) {

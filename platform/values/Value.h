@@ -22,12 +22,11 @@ class Dictionary;
 
 /// One value of a JSON document, a property list or an IPC message.
 ///
-/// Copies are cheap: strings, arrays and dictionaries are shared, and copied when one holder changes its own
-/// (`mutableArray()`, `mutableDictionary()`). Copies may be used on different threads; one object may be read by many
-/// threads, or written by one.
+/// Copies are cheap: they share strings, arrays and dictionaries, which are copied on write (`mutableArray()`,
+/// `mutableDictionary()`). Different threads may use copies; many threads may read one object, or one may write it.
 ///
-/// Reading never fails: an accessor of another type returns nothing, and `operator[]` of a missing entry returns the
-/// null value, so that `bag["a"]["b"].asString()` needs no checks in between.
+/// Reading never fails: an accessor returns nothing for a value of another type, and `operator[]` returns the null
+/// value for a missing entry, so that `bag["a"]["b"].asString()` needs no checks in between.
 class Value {
 public:
     enum class Type : std::uint8_t { Null, Bool, Int, UInt, Double, String, Bytes, Date, Array, Dictionary };
@@ -36,7 +35,7 @@ public:
     Value() = default;
     Value(std::nullptr_t) {}
     Value(bool b) : _storage(b) {}
-    /// Any other integer. Unsigned numbers that fit are kept as signed ones, so that equal numbers compare equal.
+    /// Stores unsigned numbers that fit as signed ones, so that equal numbers compare equal.
     template <class I>
         requires(std::is_integral_v<I> && !std::is_same_v<I, bool>)
     Value(I i)
@@ -60,7 +59,7 @@ public:
     Value& operator=(Value&& other) noexcept;
     ~Value();
 
-    /// Returns a dictionary of the pairs, in their order.
+    /// Returns a dictionary of the entries, in their order.
     static Value dictionaryOf(std::initializer_list<std::pair<std::string, Value>> entries);
 
     [[nodiscard]] Type type() const { return static_cast<Type>(_storage.index()); }
@@ -68,38 +67,39 @@ public:
     [[nodiscard]] bool isNumber() const;
 
     [[nodiscard]] std::optional<bool> asBool() const;
-    /// An integer that fits, or a double that is whole and fits.
+    /// Returns an integer, or a double that is a whole number, if it is in range; otherwise nothing.
     [[nodiscard]] std::optional<std::int64_t> asInt() const;
     [[nodiscard]] std::optional<std::uint64_t> asUInt() const;
-    /// Any number.
+    /// Returns any number; an integer beyond 2^53 is rounded.
     [[nodiscard]] std::optional<double> asDouble() const;
-    /// The string, or null for another type; likewise the next four. Valid until this value is changed.
+    /// This and the next four return null (or nothing) for a value of another type. Pointers are valid until this value
+    /// is changed.
     [[nodiscard]] const std::string* asString() const;
     [[nodiscard]] const platform::Bytes* asBytes() const;
     [[nodiscard]] std::optional<platform::Date> asDate() const;
     [[nodiscard]] const Array* asArray() const;
     [[nodiscard]] const Dictionary* asDictionary() const;
 
-    /// The entry of a dictionary, or the null value.
+    /// Returns the entry of a dictionary, or the null value.
     [[nodiscard]] const Value& operator[](std::string_view key) const;
-    /// For literals, which would otherwise convert to an index.
     [[nodiscard]] const Value& operator[](const char* key) const { return (*this)[std::string_view(key)]; }
-    /// The element of an array, or the null value.
+    /// Returns the element of an array, or the null value.
     template <class I>
         requires std::is_integral_v<I>
     [[nodiscard]] const Value& operator[](I index) const
     {
         return element(static_cast<std::size_t>(index));
     }
-    /// The number of elements of an array or entries of a dictionary; 0 for other types.
+    /// Returns the number of elements of an array or entries of a dictionary; 0 for other types.
     [[nodiscard]] std::size_t count() const;
 
-    /// Returns this value's own array, to be changed. A value of another type becomes an empty array first.
+    /// Returns the array for writing; copies it first if it is shared. Turns a value of another type into an empty
+    /// array.
     [[nodiscard]] Array& mutableArray();
-    /// Returns this value's own dictionary, to be changed. A value of another type becomes an empty dictionary first.
+    /// Likewise for a dictionary.
     [[nodiscard]] Dictionary& mutableDictionary();
 
-    /// Compares type and contents, dictionaries regardless of order.
+    /// Compares types and contents; ignores the order of dictionaries.
     friend bool operator==(const Value& a, const Value& b);
 
 private:
@@ -111,10 +111,10 @@ private:
         _storage;
 };
 
-/// Returns "null", "bool", …, for error texts.
+/// Returns "null", "bool", "integer", …, for error texts.
 [[nodiscard]] std::string_view typeName(Value::Type type);
 
-/// How deep arrays and dictionaries may nest in input from outside.
+/// The limit of nesting of arrays and dictionaries in input from outside.
 constexpr std::size_t kMaximumDepth = 128;
 
 } // namespace platform

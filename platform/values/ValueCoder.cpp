@@ -9,7 +9,7 @@ namespace {
 
 constexpr std::string_view kClassKey = "class";
 
-/// Builds the dictionary of a record.
+/// Builds a dictionary from a record.
 class ValueEncoder final : public Encoder {
 public:
     void beginRecord(std::string_view className, std::size_t fieldCount) override
@@ -37,7 +37,7 @@ public:
 private:
     /// A record or an array that is being built.
     struct Open {
-        std::optional<Dictionary> record; ///< none: an array
+        std::optional<Dictionary> record; ///< empty for an array
         std::string_view key;
         Value::Array elements;
     };
@@ -63,7 +63,7 @@ private:
     Value _root;
 };
 
-/// Reads a record from its dictionary, which must not change meanwhile.
+/// Reads a record from its dictionary, which must outlive the decoder unchanged.
 class ValueDecoder final : public Decoder {
 public:
     ValueDecoder(const Value& value, const RecordClasses& classes) : Decoder(classes), _here(&value) {}
@@ -135,7 +135,7 @@ public:
     }
 
 private:
-    /// A record or an array that was entered.
+    /// A record or an array that is being read.
     struct Open {
         const Dictionary* record = nullptr;
         const Value::Array* array = nullptr;

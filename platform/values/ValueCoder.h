@@ -6,11 +6,12 @@
 
 namespace platform {
 
-/// Encodes a record as a dictionary with its class under "class", the form that crosses IPC as a{sv}. Null fields are
-/// left out. Any thread, like all of these.
+/// Encodes a record as a dictionary with its class name under "class": the form that IPC sends as a{sv}. Null fields
+/// are left out. Any thread.
 [[nodiscard]] Value toValue(const Record& record);
-/// Decodes such a dictionary. A date may be a number: seconds since 1970, as in IPC messages. Records may nest
-/// `kMaximumDepth` deep, here and in archives, and so may each field of type Value.
+/// Decodes a dictionary of that form. A date may be a number (seconds since 1970), as in IPC messages. Returns an error
+/// of domain "Format" for an unknown class, a field of the wrong type, or records nested deeper than `kMaximumDepth`. A
+/// field of type Value may nest as deep again. Any thread.
 [[nodiscard]] Result<std::shared_ptr<Record>> recordFromValue(const Value& value, const RecordClasses& classes);
 
 } // namespace platform
