@@ -82,7 +82,6 @@ public:
 
     /// Returns the entry of a dictionary, or the null value.
     [[nodiscard]] const Value& operator[](std::string_view key) const;
-    [[nodiscard]] const Value& operator[](const char* key) const { return (*this)[std::string_view(key)]; }
     /// Returns the element of an array, or the null value.
     template <class I>
         requires std::is_integral_v<I>
