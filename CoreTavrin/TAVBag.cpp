@@ -1,6 +1,8 @@
 #include "CoreTavrin/TAVBag.h"
 
+#include <algorithm>
 #include <cmath>
+#include <tuple>
 
 #include <fmt/format.h>
 
@@ -102,24 +104,43 @@ template <class T> struct Key {
     }
 };
 
-constexpr Key<Text> kVersion{"version"};
-constexpr Key<Switch> kIsEnabled{"isEnabled"};
-constexpr Key<Switch> kFeedbackEnabled{"feedbackEnabled"};
-constexpr Key<Count> kMinimumQueryLength{"minimumQueryLength"};
-constexpr Key<Seconds> kTimeoutIntervalForRequest{"timeoutIntervalForRequest"};
-constexpr Key<HttpUrl> kSearchURL{"searchURL"};
-constexpr Key<HttpUrl> kWarmURL{"warmURL"};
-constexpr Key<HttpUrl> kFlightURL{"flightURL"};
-constexpr Key<HttpUrl> kFeedbackURL{"feedbackURL"};
-constexpr Key<HttpUrl> kCrowdsourcingURL{"crowdsourcingURL"};
-constexpr Key<UrlTemplate> kImageURL{"imageURL"};
-constexpr Key<Switch> kSendGeoEnvironmentHeader{"sendGeoEnvironmentHeader"};
-constexpr Key<Texts> kSupportedGeoLocationSources{"supportedGeoLocationSources"};
-constexpr Key<Switch> kHashtagImagesVisible{"hashtagImagesVisible"};
-constexpr Key<Texts> kSubscriptionDomains{"subscriptionProviderDomainWhitelist"};
-constexpr Key<Texts> kSubscriptionBundleIdentifiers{"subscriptionProviderBundleIdentifierWhitelist"};
-constexpr Key<Seconds> kSubscriptionTTL{"subscriptionTTL"};
-constexpr Key<ViewsByClient> kClients{"clients"};
+/// Every key of the bag except those of the downloadable resources (`kTAVResourceIdentifiers`).
+constexpr std::tuple kKeys{
+    Key<Text>{"version"},
+    Key<Switch>{"isEnabled"},
+    Key<Switch>{"feedbackEnabled"},
+    Key<Count>{"minimumQueryLength"},
+    Key<Seconds>{"timeoutIntervalForRequest"},
+    Key<HttpUrl>{"searchURL"},
+    Key<HttpUrl>{"warmURL"},
+    Key<HttpUrl>{"flightURL"},
+    Key<HttpUrl>{"feedbackURL"},
+    Key<HttpUrl>{"crowdsourcingURL"},
+    Key<UrlTemplate>{"imageURL"},
+    Key<Switch>{"sendGeoEnvironmentHeader"},
+    Key<Texts>{"supportedGeoLocationSources"},
+    Key<Switch>{"hashtagImagesVisible"},
+    Key<Texts>{"subscriptionProviderDomainWhitelist"},
+    Key<Texts>{"subscriptionProviderBundleIdentifierWhitelist"},
+    Key<Seconds>{"subscriptionTTL"},
+    Key<ViewsByClient>{"clients"},
+};
+
+/// A key's name as a template argument.
+template <std::size_t Size> struct Name {
+    consteval Name(const char (&name)[Size]) { std::ranges::copy(name, text); }
+    char text[Size];
+};
+
+consteval std::size_t rowOf(std::string_view name)
+{
+    std::size_t row = 0;
+    std::apply([&](const auto&... key) { (void)((key.name == name || (++row, false)) || ...); }, kKeys);
+    return row;
+}
+
+/// The key of this name. A name that the table lacks does not compile.
+template <Name name> constexpr const auto& kKey = std::get<rowOf(name.text)>(kKeys);
 
 void findProblems(const Value& view, const std::string& where, std::vector<std::string>& problems)
 {
@@ -135,24 +156,7 @@ void findProblems(const Value& view, const std::string& where, std::vector<std::
 const std::vector<TAVBag::KnownKey>& TAVBag::knownKeys()
 {
     static const std::vector<KnownKey> all = [] {
-        std::vector<KnownKey> keys{kVersion.known(),
-                                   kIsEnabled.known(),
-                                   kFeedbackEnabled.known(),
-                                   kMinimumQueryLength.known(),
-                                   kTimeoutIntervalForRequest.known(),
-                                   kSearchURL.known(),
-                                   kWarmURL.known(),
-                                   kFlightURL.known(),
-                                   kFeedbackURL.known(),
-                                   kCrowdsourcingURL.known(),
-                                   kImageURL.known(),
-                                   kSendGeoEnvironmentHeader.known(),
-                                   kSupportedGeoLocationSources.known(),
-                                   kHashtagImagesVisible.known(),
-                                   kSubscriptionDomains.known(),
-                                   kSubscriptionBundleIdentifiers.known(),
-                                   kSubscriptionTTL.known(),
-                                   kClients.known()};
+        auto keys = std::apply([](const auto&... key) { return std::vector{key.known()...}; }, kKeys);
         for (std::string_view resource : kTAVResourceIdentifiers) keys.push_back(Key<HttpUrl>{resource}.known());
         return keys;
     }();
@@ -162,7 +166,7 @@ const std::vector<TAVBag::KnownKey>& TAVBag::knownKeys()
 TAVBag::TAVBag(Value rawBag, std::string userAgent) : _rawBag(std::move(rawBag)), _userAgent(std::move(userAgent))
 {
     if (!_rawBag.asDictionary()) _rawBag = platform::Dictionary();
-    if (const auto name = extractClientNameFromString(_userAgent)) _clientView = _rawBag[kClients.name][*name];
+    if (const auto name = extractClientNameFromString(_userAgent)) _clientView = _rawBag[kKey<"clients">.name][*name];
 }
 
 template <class Key> auto TAVBag::read(const Key& key) const
@@ -173,43 +177,43 @@ template <class Key> auto TAVBag::read(const Key& key) const
 
 std::string TAVBag::version() const
 {
-    return read(kVersion).value_or("");
+    return read(kKey<"version">).value_or("");
 }
 bool TAVBag::isEnabled() const
 {
-    return read(kIsEnabled).value_or(true);
+    return read(kKey<"isEnabled">).value_or(true);
 }
 bool TAVBag::feedbackEnabled() const
 {
-    return read(kFeedbackEnabled).value_or(true);
+    return read(kKey<"feedbackEnabled">).value_or(true);
 }
 std::uint64_t TAVBag::minimumQueryLength() const
 {
-    return read(kMinimumQueryLength).value_or(1);
+    return read(kKey<"minimumQueryLength">).value_or(1);
 }
 std::optional<double> TAVBag::timeoutIntervalForRequest() const
 {
-    return read(kTimeoutIntervalForRequest);
+    return read(kKey<"timeoutIntervalForRequest">);
 }
 std::optional<Url> TAVBag::searchURL() const
 {
-    return read(kSearchURL);
+    return read(kKey<"searchURL">);
 }
 std::optional<Url> TAVBag::warmURL() const
 {
-    return read(kWarmURL);
+    return read(kKey<"warmURL">);
 }
 std::optional<Url> TAVBag::flightURL() const
 {
-    return read(kFlightURL);
+    return read(kKey<"flightURL">);
 }
 std::optional<Url> TAVBag::feedbackURL() const
 {
-    return read(kFeedbackURL);
+    return read(kKey<"feedbackURL">);
 }
 std::optional<Url> TAVBag::crowdsourcingURL() const
 {
-    return read(kCrowdsourcingURL);
+    return read(kKey<"crowdsourcingURL">);
 }
 std::optional<Url> TAVBag::resourceURL(std::string_view identifier) const
 {
@@ -217,33 +221,33 @@ std::optional<Url> TAVBag::resourceURL(std::string_view identifier) const
 }
 bool TAVBag::sendGeoEnvironmentHeader() const
 {
-    return read(kSendGeoEnvironmentHeader).value_or(false);
+    return read(kKey<"sendGeoEnvironmentHeader">).value_or(false);
 }
 std::optional<bool> TAVBag::hashtagImagesVisible() const
 {
-    return read(kHashtagImagesVisible);
+    return read(kKey<"hashtagImagesVisible">);
 }
 double TAVBag::subscriptionTTL() const
 {
-    return read(kSubscriptionTTL).value_or(86400);
+    return read(kKey<"subscriptionTTL">).value_or(86400);
 }
 std::vector<std::string> TAVBag::supportedGeoLocationSources() const
 {
-    return read(kSupportedGeoLocationSources).value_or(std::vector<std::string>());
+    return read(kKey<"supportedGeoLocationSources">).value_or(std::vector<std::string>());
 }
 std::optional<std::vector<std::string>> TAVBag::subscriptionProviderDomainWhitelist() const
 {
-    return read(kSubscriptionDomains);
+    return read(kKey<"subscriptionProviderDomainWhitelist">);
 }
 std::optional<std::vector<std::string>> TAVBag::subscriptionProviderBundleIdentifierWhitelist() const
 {
-    return read(kSubscriptionBundleIdentifiers);
+    return read(kKey<"subscriptionProviderBundleIdentifierWhitelist">);
 }
 
 std::optional<Url> TAVBag::urlForIdentifier(std::string_view identifier) const
 {
     static constexpr std::string_view kPlaceholder = "{id}";
-    auto text = read(kImageURL);
+    auto text = read(kKey<"imageURL">);
     const std::size_t at = text ? text->find(kPlaceholder) : std::string::npos;
     if (at == std::string::npos) return std::nullopt;
     text->replace(at, kPlaceholder.size(), platform::percentEncodePathSegment(identifier));
@@ -254,7 +258,7 @@ std::vector<std::string> TAVBag::problems() const
 {
     std::vector<std::string> problems;
     findProblems(_rawBag, "", problems);
-    if (const platform::Dictionary* clients = _rawBag[kClients.name].asDictionary()) {
+    if (const platform::Dictionary* clients = _rawBag[kKey<"clients">.name].asDictionary()) {
         for (const auto& [name, view] : *clients) {
             if (view.asDictionary())
                 findProblems(view, fmt::format("clients.{}.", name), problems);
