@@ -14,12 +14,7 @@ namespace {
 using platform::UrlRequest;
 using StartRecord = std::shared_ptr<ZRStartNetworkSearchFeedback>;
 
-StartRecord startOf(const TAVRequest& request, const UrlRequest& httpRequest, EndpointType endpoint)
-{
-    return startNetworkSearchFeedback(request.queryString, httpRequest, request.triggerEvent, endpoint);
-}
-
-/// The input is that of the search whose results go on.
+/// Records the query of the earlier search as the input.
 StartRecord startOfMoreResults(const TAVRequest& request, const UrlRequest& httpRequest, EndpointType endpoint)
 {
     const auto& url = static_cast<const TAVMoreResultsRequest&>(request).moreResultsURL;
@@ -36,6 +31,15 @@ StartRecord startOfLookup(const TAVRequest& request, const UrlRequest& httpReque
 
 using Factory = TAVNetworkRequestFactory;
 
+constexpr RequestKind flights(std::string_view className)
+{
+    return {.className = className,
+            .logCategory = kLogFlight,
+            .name = "flight query",
+            .topic = "flights",
+            .builder = &Factory::flightRequest};
+}
+
 constexpr RequestKind kKinds[]{
     {.className = TAVSearchRequest::kClass,
      .logCategory = kLogSearch,
@@ -45,8 +49,7 @@ constexpr RequestKind kKinds[]{
      .traceAnswer = kTraceSearchAnswer,
      .isSearch = true,
      .skipsWhenDisabled = true,
-     .builder = &Factory::searchRequest,
-     .startRecord = startOf},
+     .builder = &Factory::searchRequest},
     {.className = TAVMoreResultsRequest::kClass,
      .logCategory = kLogMoreResults,
      .name = "more results query",
@@ -64,16 +67,14 @@ constexpr RequestKind kKinds[]{
      .traceAnswer = kTraceCardAnswer,
      .retryable = true,
      .servedOnEndpoint = true,
-     .builder = &Factory::cardRequest,
-     .startRecord = startOf},
+     .builder = &Factory::cardRequest},
     {.className = TAVZeroKeywordRequest::kClass,
      .logCategory = kLogZeroKeyword,
      .name = "zkw query",
      .topic = "zkw",
      .traceStart = kTraceZeroKeywordStart,
      .traceAnswer = kTraceZeroKeywordAnswer,
-     .builder = &Factory::zeroKeywordRequest,
-     .startRecord = startOf},
+     .builder = &Factory::zeroKeywordRequest},
     {.className = TAVLookupRequest::kClass,
      .logCategory = kLogLookUp,
      .name = "lookup query",
@@ -85,21 +86,17 @@ constexpr RequestKind kKinds[]{
      .expires = true,
      .builder = &Factory::lookupRequest,
      .startRecord = startOfLookup},
-    {.className = TAVFlightLookupRequest::kClass,
-     .logCategory = kLogFlight,
-     .name = "flight query",
-     .topic = "flights",
-     .builder = &Factory::flightRequest,
-     .startRecord = startOf},
-    {.className = TAVFlightSearchRequest::kClass,
-     .logCategory = kLogFlight,
-     .name = "flight query",
-     .topic = "flights",
-     .builder = &Factory::flightRequest,
-     .startRecord = startOf},
+    flights(TAVFlightLookupRequest::kClass),
+    flights(TAVFlightSearchRequest::kClass),
 };
 
 } // namespace
+
+std::shared_ptr<ZRStartNetworkSearchFeedback> startRecordOf(const TAVRequest& request, const UrlRequest& httpRequest,
+                                                            EndpointType endpoint)
+{
+    return startNetworkSearchFeedback(request.queryString, httpRequest, request.triggerEvent, endpoint);
+}
 
 const RequestKind* kindOf(const TAVRequest& request)
 {

@@ -16,6 +16,10 @@ struct TAVRequest;
 struct ZRStartNetworkSearchFeedback;
 class TAVNetworkRequestFactory;
 
+/// Creates the start record of a request, with its query as the input.
+[[nodiscard]] std::shared_ptr<ZRStartNetworkSearchFeedback>
+startRecordOf(const TAVRequest& request, const platform::UrlRequest& httpRequest, EndpointType endpoint);
+
 /// What one kind of client request has of its own. `Exchange` performs every kind with the same steps.
 ///
 /// `builder` and `startRecord` take requests of the class `className` only.
@@ -36,7 +40,7 @@ struct RequestKind {
     std::optional<platform::UrlRequest> (TAVNetworkRequestFactory::*builder)(const ClientRequest&) = nullptr;
     std::shared_ptr<ZRStartNetworkSearchFeedback> (*startRecord)(const TAVRequest& request,
                                                                  const platform::UrlRequest& httpRequest,
-                                                                 EndpointType endpoint) = nullptr;
+                                                                 EndpointType endpoint) = startRecordOf;
 };
 
 /// The kind of a request; null for a record of any other class, which is not served. Any thread.
