@@ -37,7 +37,7 @@ struct ZRCardSectionEngagementFeedback : platform::RecordOf<ZRCardSectionEngagem
     }
 };
 
-/// The same in a card of the maps application.
+/// The user chose something in a card of the maps application.
 struct ZRMapsCardSectionEngagementFeedback
     : platform::RecordOf<ZRMapsCardSectionEngagementFeedback, ZRCardSectionEngagementFeedback> {
     static constexpr std::string_view kClass = "ZRMapsCardSectionEngagementFeedback";
@@ -48,7 +48,7 @@ struct ZRMapsCardSectionEngagementFeedback
     }
 };
 
-/// The same in a store's product page.
+/// The user did something in a store's product page.
 struct ZRStoreCardSectionEngagementFeedback
     : platform::RecordOf<ZRStoreCardSectionEngagementFeedback, ZRCardSectionEngagementFeedback> {
     static constexpr std::string_view kClass = "ZRStoreCardSectionEngagementFeedback";

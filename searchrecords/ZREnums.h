@@ -6,8 +6,8 @@
 
 /// The enumerations of search and feedback records, each with its texts.
 ///
-/// Clients send the number of a value, the service reads the text at that position: numbers and texts are format, and
-/// new values go to the end. A record from outside may hold a number that no enumerator has; it is kept.
+/// Clients send the number of a value; the service receives the text at that index. Both are part of the format: append
+/// new values at the end. A client's record may hold a number without an enumerator; the number is kept.
 namespace tavrin {
 
 /// The texts of an enumeration, by value.
@@ -125,7 +125,7 @@ inline constexpr auto kTexts<StartSearchTrigger> =
           "drag_and_drop", "suggestion", "prefetch", "partial_suggestion", "lookup", "cross_button", "show_more",
           "card", "image_load", "bag", "unlock_device", "correction", "warm");
 
-/// Whom a network request goes to.
+/// The destination of a network request.
 enum class EndpointType : std::int64_t {
     Unknown,
     Tavrin,
@@ -151,7 +151,7 @@ enum class LookupSelectionType : std::int64_t { Default, Explicit, HintTap };
 template <>
 inline constexpr auto kTexts<LookupSelectionType> = texts("lookup_default", "lookup_explicit", "lookup_hint_tap");
 
-/// The index behind a local search.
+/// The index that a local search uses.
 enum class IndexType : std::int64_t {
     Unknown,
     Vistrel,

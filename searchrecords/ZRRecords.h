@@ -11,7 +11,7 @@
 
 namespace tavrin {
 
-/// Every record of this layer. Any thread.
+/// Returns the classes of all records of this layer. Any thread.
 [[nodiscard]] const platform::RecordClasses& searchRecordClasses();
 
 } // namespace tavrin

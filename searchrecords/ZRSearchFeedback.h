@@ -15,7 +15,7 @@ struct ZRStartSearchFeedback : platform::RecordOf<ZRStartSearchFeedback, ZRFeedb
 
     std::optional<std::string> input; ///< what the user had typed
     StartSearchTrigger triggerEvent = StartSearchTrigger::Unknown;
-    std::optional<std::string> uuid; ///< of this search
+    std::optional<std::string> uuid; ///< of this search, repeated in its end
     std::uint64_t queryId = 0;       ///< the client's own number of the query; 0 for none
 
     static constexpr auto fields()

@@ -48,7 +48,7 @@ struct ZRDidGoToSiteFeedback : platform::RecordOf<ZRDidGoToSiteFeedback, ZRFeedb
     static constexpr auto fields() { return std::tuple{platform::field("input", &ZRDidGoToSiteFeedback::input)}; }
 };
 
-/// A record that is JSON of the client's own making.
+/// A record whose content is JSON made by the client.
 struct ZRCustomFeedback : platform::RecordOf<ZRCustomFeedback, ZRFeedback> {
     static constexpr std::string_view kClass = "ZRCustomFeedback";
     CustomFeedbackType feedbackType = CustomFeedbackType::Unknown;
