@@ -25,7 +25,7 @@ std::string_view stringFromFeatureType(FeatureType type)
     case FeatureType::Domain: return "domain";
     case FeatureType::MediaType: return "mediaType";
     case FeatureType::Topic: return "topic";
-    default: return "unkonwn"; // as the service knows it
+    default: return "unkonwn"; // the service's spelling
     }
 }
 
@@ -73,7 +73,7 @@ std::string_view stringFromResultPlacement(ResultPlacement placement)
     switch (placement) {
     case ResultPlacement::Top: return "top";
     case ResultPlacement::Bottom: return "bottom";
-    default: return "unkonw"; // as the service knows it
+    default: return "unkonw"; // the service's spelling
     }
 }
 

@@ -8,7 +8,7 @@
 /// agent or an identifier belongs to. Pure functions, any thread.
 ///
 /// The two directions of a pair are not exact inverses, and some names are misspelled: the service relies on both. A
-/// missing or unknown text reads as `Unknown`. Returned views live for ever.
+/// missing or unknown text reads as `Unknown`. Returned views point to string literals.
 namespace tavrin {
 
 enum class FeatureType : std::uint64_t { Domain = 0, MediaType = 1, Topic = 2, Unknown = 3 };
@@ -18,25 +18,25 @@ enum class ResultPlacement : std::uint64_t { Unknown = 0, Top = 1, Bottom = 2 };
 
 using OptionalText = std::optional<std::string_view>;
 
-/// Knows "domain" and "tld", "mediatype" in any case and "mt", and "topic".
+/// Accepts "domain" and "tld"; "mt", and "mediatype" in any case; "topic".
 [[nodiscard]] FeatureType featureTypeFromString(OptionalText text);
 [[nodiscard]] std::string_view stringFromFeatureType(FeatureType type);
 [[nodiscard]] ClientType clientTypeFromString(OptionalText text);
 [[nodiscard]] std::string_view stringFromClientType(ClientType type);
-/// Knows "eng", and "engrate" and "eng/render" for one function, which prints as the latter.
+/// Accepts "eng"; "engrate" and "eng/render", which name the same function. That prints as "eng/render".
 [[nodiscard]] FunctionType funcTypeFromString(OptionalText text);
 [[nodiscard]] std::string_view stringFromFunctionType(FunctionType type);
 [[nodiscard]] ResultPlacement resultPlacementFromString(OptionalText text);
 [[nodiscard]] std::string_view stringFromResultPlacement(ResultPlacement placement);
 
-/// "wendral" or "vistrel" if the agent contains it in any case (the former wins), else "unknown".
+/// Returns "wendral" or "vistrel" if the agent contains it in any case, else "unknown". "wendral" wins over "vistrel".
 [[nodiscard]] std::string_view getClientFromUserAgent(OptionalText userAgent);
 
-/// The first of "wendral", "vistrel", "kivo", "lookup", "messages", "news", "tavrind", in this order, that the text
-/// contains in any case; nothing if it contains none of them.
+/// Returns the first of "wendral", "vistrel", "kivo", "lookup", "messages", "news", "tavrind", in this order, that the
+/// text contains in any case. Returns nothing if it contains none.
 [[nodiscard]] std::optional<std::string_view> extractClientNameFromString(OptionalText text);
 
-/// True if `text` contains `part`, in any case.
+/// Returns true if `text` contains `part`, ignoring case.
 [[nodiscard]] bool tavrin_caseInsensitiveContainsString(std::string_view text, std::string_view part);
 
 } // namespace tavrin

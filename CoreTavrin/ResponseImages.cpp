@@ -11,7 +11,7 @@ using platform::Value;
 
 namespace {
 
-/// An array or dictionary that is being searched, and how far.
+/// An array or dictionary that is being searched, and the position of the search.
 struct Level {
     const Value::Array* array;
     const Dictionary* dictionary;

@@ -13,7 +13,7 @@
 
 namespace tavrin {
 
-/// The bag: the service's configuration of the daemon, as one client sees it.
+/// The bag: the service's configuration of the daemon, in the view of one client.
 ///
 /// Every accessor reads the top-level key of its own name. A dictionary under "clients" holds, by client name, keys
 /// that override the top level; the name that `extractClientNameFromString` finds in the user agent applies. A key that
@@ -31,41 +31,42 @@ public:
     [[nodiscard]] std::string version() const;  ///< a number reads as its text; default ""
     [[nodiscard]] bool isEnabled() const;       ///< default true
     [[nodiscard]] bool feedbackEnabled() const; ///< default true
-    /// In UTF-16 units; default 1.
+    /// In UTF-16 code units; default 1.
     [[nodiscard]] std::uint64_t minimumQueryLength() const;
     /// In seconds, above 0; no default.
     [[nodiscard]] std::optional<double> timeoutIntervalForRequest() const;
 
-    // URLs are absolute, with http or https; without default.
+    // URLs are absolute and use http or https. They have no default.
 
     [[nodiscard]] std::optional<platform::Url> searchURL() const;
     [[nodiscard]] std::optional<platform::Url> warmURL() const;
     [[nodiscard]] std::optional<platform::Url> flightURL() const;
     [[nodiscard]] std::optional<platform::Url> feedbackURL() const;
     [[nodiscard]] std::optional<platform::Url> crowdsourcingURL() const;
-    /// The template "imageURL" with its "{id}" replaced by the identifier, percent-encoded.
+    /// Returns the template "imageURL" with the percent-encoded identifier in place of "{id}"; nothing if "{id}" is
+    /// missing.
     [[nodiscard]] std::optional<platform::Url> urlForIdentifier(std::string_view identifier) const;
-    /// The URL of a downloadable resource, by the resource's identifier.
+    /// Returns the URL of the downloadable resource with this identifier.
     [[nodiscard]] std::optional<platform::Url> resourceURL(std::string_view identifier) const;
 
     [[nodiscard]] bool sendGeoEnvironmentHeader() const; ///< default false
     [[nodiscard]] std::vector<std::string>
     supportedGeoLocationSources() const;                            ///< of "gps", "cell", "wifi"; default none
-    [[nodiscard]] std::optional<bool> hashtagImagesVisible() const; ///< nothing: leave it as it is
+    [[nodiscard]] std::optional<bool> hashtagImagesVisible() const; ///< nothing: don't change the setting
     [[nodiscard]] std::optional<std::vector<std::string>> subscriptionProviderDomainWhitelist() const;
     [[nodiscard]] std::optional<std::vector<std::string>> subscriptionProviderBundleIdentifierWhitelist() const;
     [[nodiscard]] double subscriptionTTL() const; ///< in seconds, above 0; default 86400
 
-    /// One text for each key, at the top level or in a client's view, whose value has the wrong type.
+    /// Returns one message for each key, at the top level or in a client's view, whose value has the wrong type.
     [[nodiscard]] std::vector<std::string> problems() const;
 
-    /// A key that is read, in words for people: "expected true or false".
+    /// A key that the daemon reads, with the type of its value as text: "true or false".
     struct KnownKey {
         std::string_view name;
         std::string_view expected;
         bool (*accepts)(const platform::Value&);
     };
-    /// All of them; those of the downloadable resources come last.
+    /// Returns all of them; the keys of downloadable resources come last.
     [[nodiscard]] static const std::vector<KnownKey>& knownKeys();
 
 private:
@@ -81,10 +82,10 @@ inline constexpr std::string_view kTAVLookupHintsWeekly = "TAVLookupHintsWeekly"
 inline constexpr std::string_view kTAVLookupHintsMonthly = "TAVLookupHintsMonthly";
 inline constexpr std::string_view kTAVCrowdsourcingBlacklist = "TAVCrowdsourcingBlacklist";
 inline constexpr std::string_view kTAVCrowdsourcingWhitelist = "TAVCrowdsourcingWhitelist";
-/// Identifiers of the downloadable resources, in the order in which they are processed.
+/// The identifiers of the downloadable resources, in the order of processing.
 extern const std::vector<std::string_view> kTAVResourceIdentifiers;
 
-/// A bag as it crosses IPC.
+/// The form in which a bag crosses IPC.
 struct TAVBagRecord : platform::RecordOf<TAVBagRecord> {
     static constexpr std::string_view kClass = "TAVBag";
     platform::Bytes rawBag; ///< JSON text
@@ -92,7 +93,7 @@ struct TAVBagRecord : platform::RecordOf<TAVBagRecord> {
 
     TAVBagRecord() = default;
     explicit TAVBagRecord(const TAVBag& bag);
-    /// The bag; null if the text is no JSON object.
+    /// Returns the bag; null if `rawBag` is not a JSON object.
     [[nodiscard]] std::shared_ptr<const TAVBag> bag() const;
     static constexpr auto fields()
     {

@@ -30,21 +30,21 @@ platform::Error clientError(std::int64_t code, std::string reason)
     return platform::Error::withReason(std::string(TAVClientErrorDomain), code, std::move(reason));
 }
 
-/// What a row reads in a message, or the message's error.
+/// Decodes a row's results from a message, or passes the message's error on.
 template <class Row> auto resultsOf(const Row& row, Result<ipc::Message> answer) -> Result<typename Row::Results>
 {
     if (!answer) return std::unexpected(std::move(answer.error()));
     return row.results(std::move(*answer));
 }
 
-/// The one result of a row that has one.
+/// Unwraps the only result of a row.
 template <class T> Result<T> only(Result<std::tuple<T>> results)
 {
     if (!results) return std::unexpected(std::move(results.error()));
     return std::get<0>(std::move(*results));
 }
 
-/// All results of a row as a structure of the same members.
+/// Converts a row's results to a structure with the same members.
 template <class Structure, class... T> Result<Structure> as(Result<std::tuple<T...>> results)
 {
     if (!results) return std::unexpected(std::move(results.error()));
@@ -80,7 +80,7 @@ void TAVConnection::sendCall(const ipc::Member& member, ipc::Message message, Me
 Result<ipc::Message> TAVConnection::call(const ipc::Member& member, ipc::Message message, platform::Duration more)
 {
     const platform::Duration timeout = _timeout + more;
-    // Shared with the handler, which outlives this call if the time is up first.
+    // Shared with the handler, which outlives this call after a time-out.
     auto answer = std::make_shared<std::optional<Result<ipc::Message>>>();
     sendCall(member, std::move(message), [answer](Result<ipc::Message> result) { *answer = std::move(result); });
     if (wait([&] { return answer->has_value(); }, timeout)) return std::move(**answer);

@@ -13,7 +13,7 @@
 #include "platform/values/Error.h"
 #include "platform/values/Value.h"
 
-/// The client's side of the daemon's IPC, for programs in C++. Other languages speak D-Bus: see docs/ipc.md.
+/// The client side of the daemon's IPC for C++ programs. Other programs use D-Bus directly: see docs/ipc.md.
 namespace tavrin {
 
 class TAVBag;
@@ -24,8 +24,8 @@ struct TAVRequest;
 struct TAVSessionConfiguration;
 struct ZRFeedback;
 
-/// Domain of errors on the way to the daemon: there is no daemon, the connection was lost, a call was refused or got no
-/// answer. Codes are those of errno.
+/// The domain of errors of a call: the connection was lost (ECONNRESET), the daemon refused the call (EPROTO), or no
+/// answer came in time (ETIMEDOUT).
 inline constexpr std::string_view TAVClientErrorDomain = "TAVClient";
 
 /// The answer to a request.
@@ -35,31 +35,33 @@ struct TAVAnswer {
     std::optional<platform::Error> error; ///< the daemon's, or the service's
 };
 
-/// The bag as this client sees it, or why there is none; an error may come with a bag, too.
+/// This client's view of the bag. `bag` is null before the first one. `error` may be set with or without a bag.
 struct TAVBagAnswer {
     std::shared_ptr<const TAVBag> bag;
     std::optional<platform::Error> error;
 };
 
-/// A downloaded resource: a descriptor of its own for its file, at the start, and its "size", "modified" and "created".
+/// A downloaded resource. `file` is a new descriptor at offset 0. `attributes` has "size" in bytes, and "modified" and
+/// "created" in seconds since 1970.
 struct TAVResourceAnswer {
     platform::FileHandle file;
     platform::Value attributes;
     std::optional<platform::Error> error;
 };
 
-/// What all kinds of connection share. Belongs to one thread; callbacks run inside `wait` and inside calls that wait.
+/// The base of all kinds of connection. Use a connection on one thread only. Callbacks run on that thread, inside
+/// `wait` and inside calls that wait for an answer.
 class TAVConnection {
 public:
     using AnswerHandler = std::function<void(platform::Result<TAVAnswer>)>;
 
-    /// How long calls wait for their answer; default 30 s, of which a daemon that is just being started takes some.
+    /// Sets how long calls wait for their answer; default 30 s, which allows for a daemon that is still starting.
     void setTimeout(platform::Duration timeout) { _timeout = timeout; }
-    /// Runs callbacks until `done()` returns true; returns false if `timeout` passes or the connection ends before. To
-    /// wait for something else too, such as keys, pass its descriptor: `done` is called again whenever that can be
-    /// read, and must read it.
+    /// Runs callbacks until `done()` returns true, then returns true. Returns false if `timeout` passes or the
+    /// connection ends first. `done` is called after each callback, and whenever `descriptor` (-1: none) is readable;
+    /// it must then read from it.
     bool wait(const std::function<bool()>& done, platform::Duration timeout, int descriptor = -1);
-    /// False after the daemon has closed the connection, as it does after an invalid configuration.
+    /// Returns false after the daemon has closed the connection, for example because of an invalid configuration.
     [[nodiscard]] bool connected() const;
 
 protected:
@@ -69,9 +71,9 @@ protected:
         : _client(std::move(client)), _interface(interface)
     {}
     using MessageHandler = std::function<void(platform::Result<platform::ipc::Message>)>;
-    /// Sends a call of `member`; `handler` gets its answer, or an error in `TAVClientErrorDomain`, inside a later wait.
+    /// Sends a call of `member`. A later wait calls `handler` with the answer or an error in `TAVClientErrorDomain`.
     void sendCall(const platform::ipc::Member& member, platform::ipc::Message message, MessageHandler handler);
-    /// Sends a call and waits for its answer, which may take the daemon `more` than others do.
+    /// Sends a call and waits for its answer, at most for the time-out plus `more`.
     platform::Result<platform::ipc::Message> call(const platform::ipc::Member& member, platform::ipc::Message message,
                                                   platform::Duration more = {});
 
@@ -80,15 +82,15 @@ protected:
     platform::Duration _timeout = std::chrono::seconds(30);
 };
 
-/// A connection to the endpoint that `configure` returns: requests for views that outlive a search, and images.
+/// A connection to the endpoint whose address `configure` returns: for views that outlive a search, and for images.
 class TAVEndpointClient : public TAVConnection {
 public:
     [[nodiscard]] static platform::Result<std::unique_ptr<TAVEndpointClient>> connect(const std::string& endpoint);
 
-    /// Serves more results and cards; requests of other kinds get no answer.
+    /// Sends a request for more results or a card. Requests of other kinds get no answer.
     platform::Result<TAVAnswer> request(const TAVRequest& request, const TAVSessionConfiguration& configuration);
-    /// The bytes of images, by their "url" or "id": of those that the daemon has within `limit`, a minute at most.
-    /// `images` are dictionaries with these keys, as in answers of the service.
+    /// Returns the bytes of those images that the daemon has loaded within `limit` (a minute at most), by "url" or
+    /// "id". `images` are dictionaries with these keys, as in answers of the service.
     platform::Result<std::map<std::string, platform::Bytes>> loadImages(const platform::Value::Array& images,
                                                                         platform::Duration limit);
 
@@ -96,7 +98,7 @@ private:
     using TAVConnection::TAVConnection;
 };
 
-/// A connection to the flusher bridge, at the address that `TAVClient::listenToFlusher` returns. A tool that watches:
+/// A connection to the flusher bridge, at the address that `TAVClient::listenToFlusher` returns. Example:
 ///
 ///     auto bridge = tavrin::TAVFlusherClient::connect(endpoint, listener);
 ///     (*bridge)->initiateConnection(FlusherIntent::WatchEvents);
@@ -107,7 +109,7 @@ public:
     [[nodiscard]] static platform::Result<std::unique_ptr<TAVFlusherClient>> connect(const std::string& endpoint,
                                                                                      TAVFlusherListener& listener);
 
-    /// Returns when the bridge has the intent; its work may end later, see `TAVFlusherListener::workDone`.
+    /// Returns once the bridge has received the intent. `TAVFlusherListener::workDone` reports the end of the work.
     platform::Result<void> initiateConnection(FlusherIntent intent);
 
 private:
@@ -120,38 +122,38 @@ private:
 ///     auto endpoint = (*client)->configure({"com.example.app", "Example/1"});
 ///     auto answer = (*client)->request(*TAVSearchRequest::searchRequestWithString("weather", trigger));
 ///
-/// While the user types, `send` a request for each key and take the answers inside `wait`: an answer that a later
-/// request has overtaken has no reply.
+/// While the user types, `send` a request for each key and receive the answers inside `wait`. The answer to a request
+/// that a later one has overtaken has no reply.
 class TAVClient : public TAVConnection {
 public:
-    /// "unix:path=$XDG_RUNTIME_DIR/com.quorvane.tavrind/socket".
+    /// Returns "unix:path=$XDG_RUNTIME_DIR/com.quorvane.tavrind/socket".
     [[nodiscard]] static std::string defaultAddress();
-    /// Connects. If systemd holds the socket, that starts the daemon.
+    /// Connects. If the socket belongs to a systemd unit, connecting starts the daemon.
     [[nodiscard]] static platform::Result<std::unique_ptr<TAVClient>>
     connect(const std::string& address = defaultAddress());
 
-    /// Introduces the client, as other calls require; returns the address for `TAVEndpointClient`.
+    /// Introduces the client; call it before any other call. Returns the address for `TAVEndpointClient`.
     platform::Result<std::string> configure(const TAVSessionConfiguration& configuration);
     platform::Result<TAVBagAnswer> bag();
     platform::Result<TAVAnswer> request(const TAVRequest& request);
     void send(const TAVRequest& request, AnswerHandler handler);
-    /// Reports what the user saw or did. The event is sent inside `wait` or the next call. `taken` is called there,
-    /// too, when the daemon has the event, or with the reason why it refused it.
+    /// Reports what the user saw or did. The next `wait` or call sends the event. It also calls `taken` once the daemon
+    /// has accepted the event, or with the reason for a refusal.
     void reportEvent(const std::string& event, std::int64_t queryId, const ZRFeedback& feedback,
                      std::function<void(platform::Result<void>)> taken = {});
-    /// The feedback of the current session, as it would be uploaded.
+    /// Returns the events of the current session that the daemon keeps in memory, in their uploaded form.
     platform::Result<platform::Value::Array> feedback();
-    /// The address of the flusher bridge.
+    /// Returns the address of the flusher bridge.
     platform::Result<std::string> listenToFlusher();
-    /// {"identifier", "agent"} of each client that the daemon knows.
+    /// Returns {"identifier", "agent"} of each client that the daemon knows.
     platform::Result<platform::Value::Array> sessions();
     platform::Result<TAVResourceAnswer> resource(const std::string& identifier);
-    /// What the daemon is doing; needs no configuration.
+    /// Returns the daemon's state as a dictionary. Needs no configuration.
     platform::Result<platform::Value> status();
-    /// The daemon's counters as OpenMetrics text; needs no configuration.
+    /// Returns the daemon's counters as OpenMetrics text. Needs no configuration.
     platform::Result<std::string> statistics();
 
-    /// Called with every bag that the daemon pushes.
+    /// Sets the callback for bags that the daemon pushes; replaces the previous one.
     void onBagDidLoad(std::function<void(TAVBagAnswer)> handler);
 
 private:

@@ -7,7 +7,7 @@
 
 namespace tavrin {
 
-/// The domain of every error that the daemon makes itself.
+/// The domain of errors that the daemon itself detects.
 inline constexpr std::string_view TAVErrorDomain = "TAVErrorDomain";
 
 /// Codes in `TAVErrorDomain`.
@@ -18,7 +18,7 @@ enum TAVErrorCode : std::int64_t {
     TAVErrorInvalidResponse = 500, ///< an invalid answer or configuration, or a request that can't be made
 };
 
-/// An error in `TAVErrorDomain` with this "reason".
+/// Creates an error in `TAVErrorDomain` with this "reason".
 [[nodiscard]] inline platform::Error makeTAVError(std::int64_t code, std::string reason)
 {
     return platform::Error::withReason(std::string(TAVErrorDomain), code, std::move(reason));

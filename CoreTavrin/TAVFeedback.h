@@ -42,7 +42,7 @@ struct TAVLookupStartNetworkSearchFeedback
     LookupSelectionType selectionType = LookupSelectionType::Default;
 
     TAVLookupStartNetworkSearchFeedback() = default;
-    /// As for its base, with a fresh `uuid`.
+    /// Creates the record of a new lookup, with a new `uuid`.
     TAVLookupStartNetworkSearchFeedback(std::string input, std::string url, platform::Value headers,
                                         StartSearchTrigger triggerEvent, EndpointType endpoint,
                                         LookupSelectionType selectionType);
@@ -53,17 +53,17 @@ struct TAVLookupStartNetworkSearchFeedback
     }
 };
 
-/// The service answered, and said something about its answer.
+/// A request was answered by the service, which described its answer.
 struct TAVEndNetworkSearchFeedback : platform::RecordOf<TAVEndNetworkSearchFeedback, ZREndNetworkSearchFeedback> {
     static constexpr std::string_view kClass = "TAVEndNetworkSearchFeedback";
 
     std::optional<std::string> tavrinStatus; ///< "OK", "ERROR"
     double tavrinDuration = 0;               ///< time that the service took, in its own unit
-    std::optional<std::string> fbq;          ///< the service's note on the query, handed back to it unread
+    std::optional<std::string> fbq;          ///< the service's opaque note on the query, returned to it in feedback
     std::optional<std::string> partialClientIp;
 
     TAVEndNetworkSearchFeedback() = default;
-    /// `start` as for the base.
+    /// Takes the `uuid` of `start`, which may be null.
     TAVEndNetworkSearchFeedback(const std::shared_ptr<ZRStartNetworkSearchFeedback>& start, std::size_t responseSize,
                                 std::int64_t statusCode, std::optional<std::string> tavrinStatus, double tavrinDuration,
                                 std::optional<std::string> fbq, std::optional<std::string> partialClientIp,
@@ -103,21 +103,21 @@ struct TAVCacheHitFeedback : platform::RecordOf<TAVCacheHitFeedback, ZRFeedback>
 /// A suggestion of the service.
 struct TAVSearchSuggestion : platform::RecordOf<TAVSearchSuggestion, ZRSearchSuggestion> {
     static constexpr std::string_view kClass = "TAVSearchSuggestion";
-    std::optional<std::string> fbr; ///< the service's note on the suggestion, handed back to it unread
+    std::optional<std::string> fbr; ///< the service's opaque note, returned to it in feedback
     static constexpr auto fields() { return std::tuple{platform::field("fbr", &TAVSearchSuggestion::fbr)}; }
 };
 
 /// The custom properties of a result of the service.
 struct TAVCustomSearchResult : platform::RecordOf<TAVCustomSearchResult> {
     static constexpr std::string_view kClass = "TAVCustomSearchResult";
-    std::optional<std::string> fbr; ///< the service's note on the result, handed back to it unread
+    std::optional<std::string> fbr; ///< the service's opaque note, returned to it in feedback
     static constexpr auto fields() { return std::tuple{platform::field("fbr", &TAVCustomSearchResult::fbr)}; }
 };
 
 /// A destination in a card of the service.
 struct TAVPunchout : platform::RecordOf<TAVPunchout, ZRPunchout> {
     static constexpr std::string_view kClass = "TAVPunchout";
-    /// The part of the card that leads there, by the service's name for it ("buy"; see `CardActionTarget`).
+    /// The service's name for the part of the card that leads there: "buy" (see `CardActionTarget`).
     std::optional<std::string> actionTarget;
     static constexpr auto fields() { return std::tuple{platform::field("actionTarget", &TAVPunchout::actionTarget)}; }
 };

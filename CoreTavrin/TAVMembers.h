@@ -18,18 +18,18 @@
 
 /// Every method and signal of the daemon's interfaces, one typed row each.
 ///
-/// The C++ types of a row give its D-Bus signatures, and encode and decode its arguments: the daemon's handlers
-/// (TAVProtocols.cpp) and the client (TAVClient.cpp) use the same rows. docs/ipc/*.xml describes them to other
+/// The C++ types of a row determine its D-Bus signatures and how its arguments are encoded and decoded. The daemon's
+/// handlers (TAVProtocols.cpp) and the client (TAVClient.cpp) use the same rows. docs/ipc/*.xml describes them to other
 /// languages; a test compares the two.
 namespace tavrin {
 
-/// An error as a{sv} (domain, code, userInfo), the empty dictionary for none; and back.
+/// Convert an error to its wire form and back: a{sv} with domain, code and userInfo, or an empty one for no error.
 [[nodiscard]] platform::Value valueFromError(const OptionalError& error);
 [[nodiscard]] OptionalError errorFromValue(const platform::Value& value);
 
 namespace wire {
 
-/// The D-Bus type that a C++ type travels as. Records, bags, errors and dictionaries are a{sv}, each empty for none.
+/// Returns the D-Bus type of a C++ type. Records, bags, errors and dictionaries are a{sv}; an empty one means no value.
 template <class T> constexpr std::string_view typeOf()
 {
     if constexpr (std::is_same_v<T, std::string>) return "s";
@@ -37,7 +37,7 @@ template <class T> constexpr std::string_view typeOf()
     if constexpr (std::is_same_v<T, std::uint64_t>) return "t";
     if constexpr (std::is_same_v<T, platform::Bytes>) return "ay";
     if constexpr (std::is_same_v<T, platform::Value::Array>) return "aa{sv}";
-    if constexpr (std::is_same_v<T, platform::FileHandle>) return "ah"; // of one handle, or none
+    if constexpr (std::is_same_v<T, platform::FileHandle>) return "ah"; // one handle, or none
     return "a{sv}";
 }
 
@@ -51,20 +51,20 @@ inline constexpr auto kSignatureText = [] {
     (add(typeOf<T>()), ...);
     return text;
 }();
-/// The signature of arguments of these types.
+/// Returns the D-Bus signature of arguments of these types.
 template <class... T> constexpr std::string_view signatureOf()
 {
     return {kSignatureText<T...>.data(), kSignatureText<T...>.size() - 1};
 }
 
-/// Adds one argument to a message.
+/// Appends one argument to a message.
 template <class T>
     requires std::is_constructible_v<platform::Value, T>
 void append(platform::ipc::Message& message, T value)
 {
     message.args.emplace_back(std::move(value));
 }
-/// A dictionary; anything else travels as an empty one.
+/// Appends a dictionary; any other value is sent as an empty one.
 void append(platform::ipc::Message& message, platform::Value value);
 void append(platform::ipc::Message& message, const platform::Record& record);
 void append(platform::ipc::Message& message, const std::shared_ptr<const TAVBag>& bag);
@@ -80,8 +80,9 @@ void append(platform::ipc::Message& message, const std::shared_ptr<R>& record)
         append(message, OptionalError());
 }
 
-/// Reads the argument at `index` back; the message has the row's signature. Fails for a record that can't be decoded
-/// or has a `problem()`. One of a class that is not known here, or not of the row's type, reads as none.
+/// Decodes the argument at `index`, and may move it out of the message. The message must have the row's signature.
+/// Fails for a record that can't be decoded or that reports a `problem()`. A record of an unknown class, or of a class
+/// that the row does not accept, decodes as null.
 template <class T> struct Take {
     static platform::Result<T> from(platform::ipc::Message& message, std::size_t index);
 };
@@ -103,7 +104,8 @@ template <> struct Take<std::shared_ptr<const TAVBag>> {
     static platform::Result<std::shared_ptr<const TAVBag>> from(platform::ipc::Message& message, std::size_t index);
 };
 
-/// All arguments of a message. `names` are theirs, separated by blanks: an error begins with the name of its argument.
+/// Decodes all arguments of a message. `names` has their names, separated by blanks; an error begins with the name of
+/// the argument that failed.
 template <class... T>
 platform::Result<std::tuple<T...>> takeAll(platform::ipc::Message& message, std::string_view names)
 {
@@ -122,7 +124,7 @@ platform::Result<std::tuple<T...>> takeAll(platform::ipc::Message& message, std:
         if (!failure) failure = malformed(std::string(name) + ": " + taken.error().reason());
         return Argument();
     };
-    std::tuple<T...> all{next(std::type_identity<T>())...}; // braces: front to back
+    std::tuple<T...> all{next(std::type_identity<T>())...}; // braces evaluate in order
     if (failure) return std::unexpected(std::move(*failure));
     return all;
 }
@@ -132,7 +134,7 @@ platform::Result<std::tuple<T...>> takeAll(platform::ipc::Message& message, std:
 template <class... T> struct In {};
 template <class... T> struct Out {};
 
-/// A method: what callers give, what they get back, and the names of both, separated by blanks.
+/// A method: the types of its arguments and results, and their names, separated by blanks.
 template <class Arguments, class Results = Out<>> struct Method;
 template <class... I, class... O> struct Method<In<I...>, Out<O...>> : platform::ipc::Member {
     using Reply = platform::Reply<O...>;
@@ -146,14 +148,14 @@ template <class... I, class... O> struct Method<In<I...>, Out<O...>> : platform:
                  .outNames = outNames_}
     {}
 
-    /// The same method of another interface than its object's own.
+    /// Returns this method as a member of the interface `home` instead of its object's main one.
     [[nodiscard]] constexpr Method on(std::string_view home) const
     {
         Method method = *this;
         method.interface = home;
         return method;
     }
-    /// The same method for callers that needn't ask for its empty answer.
+    /// Returns this method with the mark that callers needn't request its empty answer.
     [[nodiscard]] constexpr Method withoutReply() const
     {
         Method method = *this;
@@ -161,7 +163,7 @@ template <class... I, class... O> struct Method<In<I...>, Out<O...>> : platform:
         return method;
     }
 
-    /// A call. Records may be given by reference.
+    /// Encodes a call. Records may be passed by reference.
     template <class... Given> [[nodiscard]] static platform::ipc::Message call(Given&&... arguments)
     {
         static_assert(sizeof...(Given) == sizeof...(I));

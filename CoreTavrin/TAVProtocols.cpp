@@ -8,7 +8,7 @@
 #include "CoreTavrin/TAVReply.h"
 #include "CoreTavrin/TAVRequest.h"
 #include "CoreTavrin/TAVSessionConfiguration.h"
-#include "docs_ipc_xml.h" // made from docs/ipc/*.xml
+#include "docs_ipc_xml.h" // generated from docs/ipc/*.xml
 #include "platform/values/Dictionary.h"
 #include "searchrecords/ZRFeedback.h"
 
@@ -21,13 +21,13 @@ namespace {
 
 // MARK: - serving rows
 
-/// A method and what a call of it does to the exported object.
+/// A method and the function that serves its calls.
 template <class Object> struct Row {
     ipc::Member member;
     void (*serve)(Object&, ipc::Message, ipc::Responder);
 };
 
-/// A typed reply that encodes itself into the responder, and frees it when it is abandoned.
+/// Returns a typed reply that encodes its results for the responder. Abandoning it abandons the responder.
 template <class... I, class... O>
 platform::Reply<O...> replyThrough(const Method<In<I...>, Out<O...>>&, ipc::Responder responder)
 {
@@ -37,8 +37,8 @@ platform::Reply<O...> replyThrough(const Method<In<I...>, Out<O...>>&, ipc::Resp
         [shared] { shared->abandon(); });
 }
 
-/// The row that serves `method` by `call`: a member function of `Object`, or a function of it, that takes the method's
-/// arguments and its reply. Arguments that can't be decoded are refused before.
+/// Returns the row that serves `method` with `call`: a member function of `Object`, or a function on an `Object&`, that
+/// takes the method's arguments and its reply. Arguments that can't be decoded end the call with an error.
 template <class Object, const auto& method, auto call> constexpr Row<Object> row()
 {
     return {method, [](Object& object, ipc::Message message, ipc::Responder responder) {
@@ -67,7 +67,8 @@ constexpr Row<TAVDaemonXPC> kDaemonRows[] = {
         [](TAVDaemonXPC& daemon, const std::string& event, std::int64_t queryId, std::shared_ptr<ZRFeedback> feedback,
            platform::Reply<> reply) {
             if (!feedback) return reply();
-            // Answered when its last holder lets the event go: a client can't have more of them under way than calls.
+            // The answer is sent when the last holder releases the event: the limit on a client's pending calls then
+            // also limits its pending events.
             std::shared_ptr<void> call(nullptr, [answer = std::make_shared<platform::Reply<>>(std::move(reply))](
                                                     std::nullptr_t) { (*answer)(); });
             daemon.reportEvent(event, queryId, std::move(feedback), std::move(call));
@@ -103,7 +104,7 @@ constexpr Row<TAVFlusherXPC> kFlusherRows[] = {
         }>(),
 };
 
-/// Serves the call by the row of that name; false, with nothing taken, if there is none.
+/// If the table has a row of that name, serves the call with it and returns true; otherwise consumes nothing.
 template <class Object, std::size_t Count>
 bool serve(const Row<Object> (&rows)[Count], const std::weak_ptr<Object>& object, std::string_view member,
            ipc::Message& message, ipc::Responder& responder)

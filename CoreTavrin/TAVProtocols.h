@@ -10,8 +10,8 @@
 #include "platform/run/Reply.h"
 #include "platform/values/Value.h"
 
-/// The protocols that clients and the daemon speak: abstract types, and the adaptors that serve them as D-Bus
-/// interfaces by the rows of TAVMembers.h. docs/ipc.md describes the wire.
+/// The protocols between clients and the daemon as abstract types, and the adaptors that serve them as D-Bus interfaces
+/// with the rows of TAVMembers.h. docs/ipc.md describes the wire format.
 namespace tavrin {
 
 struct TAVReply;
@@ -22,67 +22,67 @@ struct ZRFeedback;
 
 using OptionalError = std::optional<platform::Error>;
 using BagReply = platform::Reply<std::shared_ptr<const TAVBag>, OptionalError>;
-/// (query id, reply or null, error or nothing). Every request of a kind that is served is answered once; others are
+/// (query id, reply or null, error or nothing). A request of a served kind is answered exactly once; any other is
 /// abandoned.
 using RequestReply = platform::Reply<std::int64_t, std::shared_ptr<TAVReply>, OptionalError>;
 using ResourceReply = platform::Reply<platform::FileHandle, platform::Value, OptionalError>;
 
-/// What the daemon offers a client. Calls arrive on the connection's queue. Records may be null: the caller sent none,
-/// or one of an unknown class.
+/// The operations that the daemon offers a client. Calls arrive on the connection's queue. A record is null if the
+/// caller sent none or one of an unknown class.
 class TAVDaemonXPC {
 public:
     virtual ~TAVDaemonXPC() = default;
-    /// Introduces the client; the reply is the address of the endpoint for `TAVEndpointXPC`. An invalid configuration
-    /// gets no reply: the connection is closed.
+    /// Introduces the client and replies with the address of the endpoint for `TAVEndpointXPC`. An invalid
+    /// configuration gets no reply and closes the connection.
     virtual void configure(std::shared_ptr<TAVSessionConfiguration> configuration,
                            platform::Reply<std::string> reply) = 0;
     virtual void bag(BagReply reply) = 0;
     /// `request` is never null.
     virtual void request(std::shared_ptr<TAVRequest> request, RequestReply reply) = 0;
     /// `feedback` is never null. The call is answered when the last copy of `call` is destroyed: hold one until the
-    /// event has been dealt with.
+    /// event is written or dropped.
     virtual void reportEvent(const std::string& event, std::int64_t queryId, std::shared_ptr<ZRFeedback> feedback,
                              std::shared_ptr<void> call) = 0;
-    /// The current session's feedback: the dictionaries that are uploaded, with relative times.
+    /// Replies with the current session's events that are kept in memory, in their uploaded form with relative times.
     virtual void feedback(const std::string& argument,
                           platform::Reply<platform::Value::Array, OptionalError> reply) = 0;
-    /// The address of the flusher bridge, for `TAVFlusherXPC`.
+    /// Replies with the address of the flusher bridge, for `TAVFlusherXPC`.
     virtual void listenToFlusher(platform::Reply<std::string> reply) = 0;
-    /// {"identifier", "agent"} of each client known.
+    /// Replies with {"identifier", "agent"} of each known client.
     virtual void listSessions(platform::Reply<platform::Value::Array> reply) = 0;
     virtual void fileHandleAndAttributesForResource(const std::string& resource, ResourceReply reply) = 0;
 };
 
-/// What the daemon reports about itself for diagnosis; needs no configuration. Calls arrive on a connection's queue.
+/// The operations for diagnosis. They need no configuration. Calls arrive on a connection's queue.
 class TAVDiagnosticsXPC {
 public:
     virtual ~TAVDiagnosticsXPC() = default;
-    /// What the daemon is doing, as a dictionary for people and scripts to read.
+    /// Returns the daemon's state as a dictionary.
     virtual platform::Value status() = 0;
-    /// The statistics counters as OpenMetrics text.
+    /// Returns the statistics counters as OpenMetrics text.
     virtual std::string statistics() = 0;
 };
 
-/// What a client is told. Any thread.
+/// The notifications that a client receives. Any thread.
 class TAVClientXPC {
 public:
     virtual ~TAVClientXPC() = default;
     virtual void bagDidLoad(const std::shared_ptr<const TAVBag>& bag, const OptionalError& error) = 0;
 };
 
-/// What the daemon serves on the endpoint that `configure` returns. Calls arrive on that connection's queue.
+/// The operations of the endpoint whose address `configure` returns. Calls arrive on that connection's queue.
 class TAVEndpointXPC {
 public:
     virtual ~TAVEndpointXPC() = default;
     /// Serves more results and cards; other kinds are abandoned. `request` is never null, `configuration` may be.
     virtual void request(std::shared_ptr<TAVRequest> request, std::shared_ptr<TAVSessionConfiguration> configuration,
                          RequestReply reply) = 0;
-    /// The bytes of images by "url" or "id": of those that are there within `timeout` nanoseconds.
+    /// Replies with the bytes of those images that are loaded within `timeout` nanoseconds, by "url" or "id".
     virtual void loadImages(platform::Value::Array images, std::uint64_t timeout,
                             platform::Reply<platform::Value> reply) = 0;
 };
 
-/// What a tool asks the flusher bridge for. The numbers are those on the wire; a tool may send others.
+/// A tool's command to the flusher bridge. The values are those on the wire; a tool may send others.
 enum class FlusherIntent : std::uint64_t {
     WatchFlushes, ///< send this tool `flushedData`
     WatchEvents,  ///< send this tool `receivedFeedbackDescription`
@@ -90,14 +90,14 @@ enum class FlusherIntent : std::uint64_t {
     Dump,         ///< end and flush all sessions now; `workDone` follows
 };
 
-/// What the flusher bridge offers a diagnostic tool. Calls arrive on that connection's queue.
+/// The operations that the flusher bridge offers a diagnostic tool. Calls arrive on that connection's queue.
 class TAVFlusherXPC {
 public:
     virtual ~TAVFlusherXPC() = default;
     virtual void initiateConnectionWithIntent(std::uint64_t intent) = 0;
 };
 
-/// What the flusher bridge tells its tool. Any thread.
+/// The notifications that a diagnostic tool receives. Any thread.
 class TAVFlusherListener {
 public:
     virtual ~TAVFlusherListener() = default;
@@ -114,15 +114,15 @@ inline constexpr std::string_view kObjectPath = "/com/quorvane/tavrind";
 [[nodiscard]] const platform::ipc::Interface& endpointInterface();
 [[nodiscard]] const platform::ipc::Interface& flusherInterface();
 
-/// Handlers that decode a call, make it on the object and encode its answer. They hold the object weakly: a call to one
-/// that is gone is not answered.
+/// Return handlers that decode a call, invoke the object and encode its answer. They hold the object weakly; after its
+/// destruction, calls get no answer.
 [[nodiscard]] platform::ipc::Handler daemonHandler(std::weak_ptr<TAVDaemonXPC> object,
                                                    std::weak_ptr<TAVDiagnosticsXPC> diagnostics);
 [[nodiscard]] platform::ipc::Handler endpointHandler(std::weak_ptr<TAVEndpointXPC> object);
 [[nodiscard]] platform::ipc::Handler flusherHandler(std::weak_ptr<TAVFlusherXPC> object);
 
-/// The peer's side of a connection, as signals. The proxy holds the connection weakly; once that is gone, what it is
-/// told goes nowhere.
+/// Return proxies that notify the peer of a connection by signals. They hold the connection weakly; after its
+/// destruction, they do nothing.
 [[nodiscard]] std::shared_ptr<TAVClientXPC> makeClientProxy(std::weak_ptr<platform::ipc::Connection> connection);
 [[nodiscard]] std::shared_ptr<TAVFlusherListener>
 makeFlusherListenerProxy(std::weak_ptr<platform::ipc::Connection> connection);

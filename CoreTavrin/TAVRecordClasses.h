@@ -4,7 +4,7 @@
 
 namespace tavrin {
 
-/// Every record that may cross IPC: the search records and those of this layer. Any thread.
+/// Returns the classes of all records that may cross IPC: the search records and those of this layer. Any thread.
 [[nodiscard]] const platform::RecordClasses& coreRecordClasses();
 
 } // namespace tavrin

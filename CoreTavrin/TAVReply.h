@@ -26,7 +26,7 @@ struct TAVHTTPRequest : platform::RecordOf<TAVHTTPRequest> {
 /// The HTTP response behind a verbose reply.
 struct TAVHTTPResponse : platform::RecordOf<TAVHTTPResponse> {
     static constexpr std::string_view kClass = "TAVHTTPResponse";
-    std::string url; ///< that answered, after redirects
+    std::string url; ///< the final one, after redirects
     std::int64_t statusCode = 0;
     platform::Value headers; ///< dictionary of strings
     static constexpr auto fields()
@@ -41,10 +41,10 @@ struct TAVHTTPResponse : platform::RecordOf<TAVHTTPResponse> {
 struct TAVReply : platform::RecordOf<TAVReply> {
     static constexpr std::string_view kClass = "TAVReply";
 
-    double scale = 0;                            ///< the request's
+    double scale = 0;                            ///< of the request
     std::shared_ptr<TAVHTTPRequest> httpRequest; ///< verbose replies only, like the response
     std::shared_ptr<TAVHTTPResponse> httpResponse;
-    /// The service's answer as JSON text (an array of result sets), as it came; nothing if it was no JSON.
+    /// The service's unchanged answer: the JSON text of an array of result sets. Nothing if it was not JSON.
     std::optional<platform::Bytes> rawResponse;
     std::optional<std::string> geoSessionEntityString;
 

@@ -11,10 +11,10 @@
 #include "platform/values/Record.h"
 #include "searchrecords/ZREnums.h"
 
-/// Requests of clients: one record for each kind, all with the fields of `TAVRequest`.
+/// The clients' requests: one record for each kind, all with the fields of `TAVRequest`.
 namespace tavrin {
 
-/// One more item for the query of the HTTP request. Without a value it is a bare name.
+/// An additional item for the HTTP request's query. Without a value, only its name is sent.
 struct TAVQueryItem : platform::RecordOf<TAVQueryItem> {
     static constexpr std::string_view kClass = "TAVQueryItem";
     std::string name;
@@ -44,10 +44,10 @@ struct TAVRequest : platform::RecordOf<TAVRequest> {
     std::optional<std::string> uuid;
     std::optional<std::string> keyboardInputMode; ///< default: the current keyboard's
     platform::Value topics;                       ///< the user's top topics: an array or dictionary, or null
-    /// From a caller that can make one call only, such as busctl, which introduces itself inside its request.
+    /// Set by a caller that can make only one call, such as busctl: introduces the client before the request is served.
     std::shared_ptr<TAVSessionConfiguration> configuration;
 
-    /// Why the daemon refuses the call that brings this record; none if it doesn't.
+    /// Returns why the daemon refuses a call with this record; nothing if the record is valid.
     [[nodiscard]] std::optional<std::string> problem() const
     {
         return configuration ? configuration->problem() : std::nullopt;

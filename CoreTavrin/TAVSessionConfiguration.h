@@ -7,17 +7,17 @@
 
 namespace tavrin {
 
-/// Who a client is and how to serve it; a client sends it first.
+/// A client's identity and preferences. A client sends it first.
 struct TAVSessionConfiguration : platform::RecordOf<TAVSessionConfiguration> {
     static constexpr std::string_view kClass = "TAVSessionConfiguration";
 
     /// The client's session identifier, "com.quorvane.vistrel". Connections with the same one share cache and session.
     std::optional<std::string> identifier;
-    /// A name/version token, "Vistrel/4.2". It goes to the service and selects the client's view of the bag.
+    /// A name/version token, "Vistrel/4.2". It is sent to the service and selects the client's view of the bag.
     std::optional<std::string> userAgent;
-    /// Don't fetch the images of answers ahead.
+    /// Disables the prefetch of images in answers.
     bool dontPreloadImages = false;
-    /// Seconds that a request may go without an answer; 0 leaves it to the bag.
+    /// The time-out of requests, in seconds; 0 uses the bag's.
     double timeoutIntervalForRequest = 0;
 
     TAVSessionConfiguration() = default;
@@ -25,9 +25,9 @@ struct TAVSessionConfiguration : platform::RecordOf<TAVSessionConfiguration> {
         : identifier(std::move(identifier_)), userAgent(std::move(userAgent_))
     {}
 
-    /// Longest identifier and user agent, in bytes: the daemon keeps both for its life.
+    /// Maximum length of identifier and user agent, in bytes each. The daemon keeps both until it ends.
     static constexpr std::size_t kMaximumName = 1024;
-    /// Why the daemon refuses the call that brings this record; none if it doesn't.
+    /// Returns why the daemon refuses a call with this record; nothing if the record is valid.
     [[nodiscard]] std::optional<std::string> problem() const
     {
         if (identifier.value_or("").size() <= kMaximumName && userAgent.value_or("").size() <= kMaximumName) return {};
