@@ -22,12 +22,12 @@ namespace platform {
 namespace {
 
 constexpr std::chrono::seconds kBatch{60};
-/// Keys are built from clients' names and agents: a hostile one must not fill the memory.
+/// Keys contain clients' names and agents: a hostile client must not exhaust memory.
 constexpr std::size_t kMaximumCounters = 4096;
-/// How many make way at once, so that finding them costs little for each.
-constexpr std::size_t kMakeWay = kMaximumCounters / 8;
+/// Evicted at once, to spread the cost of finding the least used.
+constexpr std::size_t kEvicted = kMaximumCounters / 8;
 constexpr std::size_t kMaximumKeyLength = 512;
-/// Enough for the largest file that is written: all keys made of escapes ("\u0001"), all numbers of 20 digits.
+/// The size of the largest file that can be written: all keys consist of escapes ("\u0001"), all numbers of 20 digits.
 constexpr std::size_t kMaximumSize = kMaximumCounters * (6 * kMaximumKeyLength + 32);
 
 struct KeyHash {
@@ -47,15 +47,15 @@ struct CounterStore::Impl : std::enable_shared_from_this<Impl> {
             : value(value_), uses(static_cast<std::uint64_t>(std::max<std::int64_t>(value_, 0)))
         {}
         std::atomic<std::int64_t> value;
-        std::atomic<std::uint64_t> uses; ///< those of earlier processes are taken from the value
+        std::atomic<std::uint64_t> uses; ///< starts at the value that the file has
     };
 
     mutable std::shared_mutex mutex;
     std::unordered_map<std::string, Counter, KeyHash, std::equal_to<>> counters; // under the mutex
     std::atomic<bool> writeQueued = false;
-    mutable std::mutex writing; // keeps an older state from overwriting a newer one
+    mutable std::mutex writing; // orders writers: an older snapshot must not overwrite a newer one
 
-    /// Calls `change` with the counter's value; makes the counter if it isn't there.
+    /// Calls `change` with the counter's value; creates the counter if it is missing.
     template <class Change> void with(std::string_view key, Change change)
     {
         {
@@ -70,7 +70,7 @@ struct CounterStore::Impl : std::enable_shared_from_this<Impl> {
         {
             std::unique_lock lock(mutex);
             if (key.size() > kMaximumKeyLength) return;
-            if (counters.size() >= kMaximumCounters && !counters.contains(key)) makeWay();
+            if (counters.size() >= kMaximumCounters && !counters.contains(key)) evict();
             Counter& counter = counters.try_emplace(std::string(key), 0).first->second;
             change(counter.value);
             ++counter.uses;
@@ -78,13 +78,13 @@ struct CounterStore::Impl : std::enable_shared_from_this<Impl> {
         changed();
     }
 
-    /// Removes the least used. Under the mutex, exclusively.
-    void makeWay()
+    /// Removes the least used counters. The caller holds the mutex exclusively.
+    void evict()
     {
         std::vector<std::pair<std::uint64_t, std::string_view>> byUse;
         for (const auto& [key, counter] : counters) byUse.emplace_back(counter.uses.load(), key);
-        std::ranges::nth_element(byUse, byUse.begin() + kMakeWay);
-        byUse.resize(kMakeWay);
+        std::ranges::nth_element(byUse, byUse.begin() + kEvicted);
+        byUse.resize(kEvicted);
         for (const auto& [uses, key] : byUse) counters.erase(counters.find(key));
     }
 

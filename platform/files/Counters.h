@@ -14,15 +14,18 @@ class Queue;
 
 /// Aggregate statistics: named 64-bit counters. Any thread; an addition costs a hash look-up and two atomic adds.
 ///
-/// There are 4096 counters at most, with names of 512 bytes at most: names come from clients. A longer name isn't
-/// counted; past the limit an eighth of the counters, those that were used least, make way for new ones.
+/// Names come from clients, so there are limits: 4096 counters, names of 512 bytes. A counter with a longer name is
+/// ignored. At the limit of counters, the eighth that was used least is removed.
 ///
-/// With a file, counts survive the process: they are read when the store is made and written in batches, a minute after
-/// the first change, so an idle process doesn't wake for them. A kill loses at most that minute, and nothing of what
-/// `synchronize` has written. Without a file they live in memory.
+/// With a file, counts survive the process: the constructor reads them, and a batch is written one minute after its
+/// first change, so that an idle process doesn't wake up. A kill loses at most that minute. Without a file, counters
+/// are in memory only.
 class CounterStore {
 public:
+    /// Creates a store in memory only.
     CounterStore();
+    /// Reads the file at `path`; starts empty if it is missing or damaged, which is logged. `writeQueue` runs the
+    /// writes. `files` must outlive the queue's work.
     CounterStore(FileSystem& files, std::filesystem::path path, std::shared_ptr<Queue> writeQueue);
     ~CounterStore();
     CounterStore(const CounterStore&) = delete;
@@ -31,14 +34,15 @@ public:
     void add(std::string_view key, std::int64_t amount);
     void set(std::string_view key, std::int64_t value);
     void clear(std::string_view key);
-    /// Writes the counters now, synced; does nothing without a file. A failure is logged, and they are written again
-    /// with the next batch.
+    /// Writes and syncs the counters before it returns; does nothing without a file. Logs a failure; the next batch
+    /// writes them again.
     void synchronize();
 
-    /// Returns 0 for a counter that was never touched. For diagnostics and tests.
+    /// Returns 0 for an unknown counter. For diagnostics and tests.
     [[nodiscard]] std::int64_t value(std::string_view key) const;
     [[nodiscard]] std::map<std::string, std::int64_t> snapshot() const;
-    /// The counters as OpenMetrics text: one family, named `family`, each counter's name as the label "key".
+    /// Returns the counters in OpenMetrics text format: one family, named `family`, with the counter's name as the
+    /// label "key".
     [[nodiscard]] std::string openMetrics(std::string_view family) const;
 
 private:

@@ -20,8 +20,7 @@ constexpr std::uint32_t kLosses = IN_DELETE_SELF | IN_MOVE_SELF | IN_IGNORED | I
 
 } // namespace
 
-/// The loop shares one inotify instance among all its sources. What it sees is noted, and looked at once when no
-/// further event waits.
+/// Notes each event, and evaluates them once no further event is pending.
 struct FileWatch::Impl {
     Impl(sd_event* loop_, fs::path path_, std::function<void()> changed_)
         : loop(loop_), path(std::move(path_)), changed(std::move(changed_))
@@ -32,7 +31,7 @@ struct FileWatch::Impl {
         };
         if (sd_event_add_defer(loop, &later, look, this) < 0) return; // out of memory
         sd_event_source_set_enabled(later, SD_EVENT_OFF);
-        sd_event_source_set_priority(later, SD_EVENT_PRIORITY_NORMAL + 1); // behind the events that wait
+        sd_event_source_set_priority(later, SD_EVENT_PRIORITY_NORMAL + 1); // after all pending events
         aim();
     }
     ~Impl()
@@ -47,14 +46,14 @@ struct FileWatch::Impl {
     fs::path watched;                  // the directory
     sd_event_source* events = nullptr; // of that directory
     sd_event_source* later = nullptr;
-    // Seen since the last look.
-    bool mine = false;
-    bool elsewhere = false;
-    bool lost = false; // the directory was removed or moved, and perhaps another is in its place by now
+    // Events since the last evaluation.
+    bool mine = false;      // of the path
+    bool elsewhere = false; // of a parent: the directory may exist now
+    bool lost = false;      // the watched directory was removed or moved, and possibly replaced
 
     [[nodiscard]] fs::path folder() const { return path.parent_path(); }
 
-    /// The file's directory, or the nearest parent that is there.
+    /// Returns the file's directory, or its nearest existing parent.
     [[nodiscard]] fs::path nearest() const
     {
         fs::path found = folder();
@@ -63,7 +62,7 @@ struct FileWatch::Impl {
         return found;
     }
 
-    /// Watches that one. Looks again afterwards, for what was made in between.
+    /// Watches the nearest directory. Repeats until it doesn't change: a nearer one may have been created meanwhile.
     void aim()
     {
         for (fs::path next = nearest(); next != watched; next = nearest()) {

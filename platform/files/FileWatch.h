@@ -8,12 +8,12 @@ namespace platform {
 
 class RunLoop;
 
-/// Watches one path by inotify, so that it is seen when the file is made, written, replaced or removed. The directory
-/// is watched, not the file; while that is missing, its nearest parent is. A path that ends in "/" stands for
-/// everything that is directly in that directory.
+/// Calls `changed` after a file was created, written, replaced or removed. Uses inotify on the file's directory; while
+/// that is missing, on its nearest existing parent. A path that ends in "/" selects all entries of that directory.
 ///
-/// All watches of a run loop share one inotify instance. If the system has none left, a line is logged and changes go
-/// unseen. Made and destroyed on the run loop's thread; `changed` is called there, once for a burst of changes.
+/// All watches of a run loop share one inotify instance. If inotify fails (the system's limits), logs an error and
+/// reports no changes. Create and destroy on the run loop's thread, where `changed` runs, once for a burst of changes;
+/// the run loop must outlive the watch.
 class FileWatch {
 public:
     FileWatch(RunLoop& runLoop, std::filesystem::path path, std::function<void()> changed);

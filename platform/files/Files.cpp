@@ -30,7 +30,7 @@ std::unexpected<Error> failure(const fs::path& path)
     return std::unexpected(Error::posix(errno, path.string()));
 }
 
-/// EINTR is no failure.
+/// Repeats a system call that a signal interrupted.
 template <class Call> auto retried(Call call)
 {
     decltype(call()) result;
@@ -44,12 +44,13 @@ Date dateOf(const statx_timestamp& time)
     return dateFromSystemTime(time.tv_sec, time.tv_nsec);
 }
 
-/// Copies the whole of `from`. False, with errno, if that fails or it is more than `maximumSize` bytes (EFBIG).
+/// Copies the whole of `from`. Returns false and sets errno if that fails; EFBIG if it is more than `maximumSize`
+/// bytes.
 bool copyAll(int from, int to, std::uint64_t maximumSize)
 {
     std::array<char, 64 * 1024> chunk;
     off_t offset = 0;
-    bool byKernel = true; // until it says that it can't
+    bool byKernel = true; // until copy_file_range refuses these files
     while (static_cast<std::uint64_t>(offset) <= maximumSize) {
         ssize_t count = 0;
         if (byKernel) {
@@ -82,7 +83,7 @@ FileInfo infoOf(const struct statx& status)
     return info;
 }
 
-/// Synced, it keeps what was renamed in it over a power cut.
+/// Opens a directory for fsync, which makes renames in it durable.
 FileHandle openDirectory(const fs::path& directory)
 {
     return FileHandle(open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
@@ -90,14 +91,14 @@ FileHandle openDirectory(const fs::path& directory)
 
 class SystemAppendFile final : public AppendFile {
 public:
-    /// `file` is new, and nobody else's.
+    /// `file` must be empty and not be written by others.
     explicit SystemAppendFile(FileHandle file) : _file(std::move(file)) {}
 
     std::uint64_t size() const override { return _size; }
 
     Result<void> append(std::initializer_list<std::string_view> parts) override
     {
-        if (_broken) return std::unexpected(Error::posix(EIO, "ends in a half-written record"));
+        if (_broken) return std::unexpected(Error::posix(EIO, "ends in a partial record"));
         std::array<iovec, kMaximumParts> rest;
         std::size_t count = 0;
         std::uint64_t total = 0;
@@ -129,7 +130,7 @@ private:
     static constexpr std::size_t kMaximumParts = 4;
     FileHandle _file;
     std::uint64_t _size = 0;
-    bool _broken = false; // ends in a half-written record that could not be cut off
+    bool _broken = false; // ends in a partial record that could not be truncated
 };
 
 class SystemFiles final : public FileSystem {
@@ -248,7 +249,7 @@ public:
 
     Result<FileHandle> openForReading(const fs::path& path) override
     {
-        // Non-blocking, or a pipe in the file's place would hold us until someone writes.
+        // Non-blocking: opening a pipe in the file's place would wait for a writer.
         FileHandle file(retried([&] { return open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC); }));
         struct stat status{};
         if (!file || fstat(file.fd(), &status) != 0) return failure(path);
@@ -298,7 +299,7 @@ public:
 private:
     enum class Sync { Yes, No };
 
-    /// Writes a temporary file beside `path` with `fill`, and makes it `path`.
+    /// Writes a temporary file in the same directory with `fill`, and renames it to `path`.
     template <class Fill> static Result<void> publish(const fs::path& path, Fill fill, Sync sync = Sync::Yes)
     {
         const fs::path temporary = path.string() + "." + Uuid::random().string().substr(0, 8) + ".tmp";
@@ -319,10 +320,10 @@ private:
 fs::path fromEnvironmentOr(const char* variable, const fs::path& fallback)
 {
     const char* value = std::getenv(variable);
-    return value && *value == '/' ? fs::path(value) : fallback; // relative paths are to be ignored
+    return value && *value == '/' ? fs::path(value) : fallback; // XDG: ignore relative paths
 }
 
-/// The absolute paths of a list with ":" between them.
+/// Returns the absolute paths of a list separated by ":".
 std::vector<fs::path> pathsIn(std::string_view list)
 {
     std::vector<fs::path> paths;

@@ -17,17 +17,17 @@ static_assert(Sqlite::kCorrupt == SQLITE_CORRUPT);
 
 namespace {
 
-/// Of a file that others write: what a query may cost.
-constexpr int kMostSteps = 10'000'000;
+/// Limits of a query on a file that others write.
+constexpr int kMostSteps = 10'000'000; // of SQLite's virtual machine
 constexpr int kLongestRow = 256 << 10; // bytes
-/// How long others may keep a shared database.
+/// How long to wait for other users of a shared database.
 constexpr int kPatience = 1000; // milliseconds
 
 } // namespace
 
 void Sqlite::Close::operator()(sqlite3* database) const
 {
-    sqlite3_close_v2(database); // once its statements are gone too
+    sqlite3_close_v2(database); // closes after the last statement is finalized
 }
 
 void Sqlite::Finalize::operator()(sqlite3_stmt* statement) const
@@ -44,7 +44,7 @@ std::unexpected<Error> Sqlite::failure() const
 
 Result<Sqlite> Sqlite::open(const std::filesystem::path& path, Access access)
 {
-    // SQLite takes the mode of its other files from the database's, and refuses a link anywhere in the path.
+    // SQLite copies the database's mode to its other files, and refuses a symbolic link anywhere in the path.
     std::error_code error;
     const auto directory = std::filesystem::canonical(path.parent_path(), error);
     if (error) return std::unexpected(Error::posix(error.value(), path.parent_path().string()));
@@ -68,7 +68,7 @@ Result<Sqlite> Sqlite::open(const std::filesystem::path& path, Access access)
         if (!database) return std::unexpected(Error::posix(ENOMEM, real.string()));
         return result.failure();
     }
-    // A file that was meddled with must not make SQLite call what we didn't mean it to.
+    // A manipulated file must not make SQLite call functions through its schema.
     sqlite3_db_config(database, SQLITE_DBCONFIG_DEFENSIVE, 1, nullptr);
     sqlite3_db_config(database, SQLITE_DBCONFIG_TRUSTED_SCHEMA, 0, nullptr);
     if (readOnly) {
@@ -77,7 +77,7 @@ Result<Sqlite> Sqlite::open(const std::filesystem::path& path, Access access)
     }
     if (access == Access::Shared) sqlite3_busy_timeout(database, kPatience);
     if (access != Access::Exclusive) return result;
-    // A write-ahead log of an exclusive database needs no shared memory, and costs one sync a transaction.
+    // The write-ahead log of an exclusive database needs no shared memory and costs one sync a transaction.
     if (auto set =
             result.execute("PRAGMA locking_mode = EXCLUSIVE; PRAGMA journal_mode = WAL; PRAGMA synchronous = FULL;"
                            "PRAGMA wal_autocheckpoint = 256; PRAGMA cache_size = -512");
@@ -94,7 +94,8 @@ Result<void> Sqlite::adopt(std::span<const char* const> schema)
                     {}, [&](const Row& row) { found.emplace_back(row.text(0)); });
     if (!done || std::ranges::equal(found, schema)) return done;
     if (!found.empty())
-        return std::unexpected(Error::withReason(std::string(kSqliteErrorDomain), kCorrupt, "it has other tables"));
+        return std::unexpected(
+            Error::withReason(std::string(kSqliteErrorDomain), kCorrupt, "the tables are different"));
     return transaction([&] {
         Result<void> made;
         for (const char* statement : schema)
@@ -122,7 +123,7 @@ Result<void> Sqlite::run(std::string_view statement, std::initializer_list<Param
         if (const auto* number = std::get_if<std::int64_t>(&parameter))
             bound = sqlite3_bind_int64(made, position, *number);
         else if (const auto* text = std::get_if<std::string_view>(&parameter))
-            // A null pointer would be a null.
+            // SQLite would bind a null pointer as NULL.
             bound = sqlite3_bind_text64(made, position, text->empty() ? "" : text->data(), text->size(), SQLITE_STATIC,
                                         SQLITE_UTF8);
         if (bound != SQLITE_OK) return failure();
@@ -137,7 +138,8 @@ Result<void> Sqlite::run(std::string_view statement, std::initializer_list<Param
     return {};
 }
 
-/// Removed from the cache: a callback may run the same statement. Empty if the text is no statement.
+/// Removes the compiled statement from the cache, because a callback may run the same statement. Empty if the text
+/// doesn't compile.
 Sqlite::Statements::node_type Sqlite::takeStatement(std::string_view text)
 {
     auto found = _statements.find(text);

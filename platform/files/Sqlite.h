@@ -19,16 +19,16 @@ struct sqlite3_stmt;
 
 namespace platform {
 
-/// Domain of the database's errors; the codes are SQLite's primary result codes.
+/// Domain of database errors. Codes are SQLite's primary result codes.
 inline constexpr std::string_view kSqliteErrorDomain = "SQLite";
 
-/// An open SQLite database, closed with its last owner. One thread at a time.
+/// An open SQLite database; the destructor closes it. One thread at a time.
 class Sqlite {
 public:
-    /// Null, a number or a text, as a statement's parameter.
+    /// A statement's parameter: null, a number or a text.
     using Parameter = std::variant<std::monostate, std::int64_t, std::string_view>;
 
-    /// A row of a query's result, as long as the callback runs.
+    /// A row of a query's result; valid inside the callback.
     class Row {
     public:
         [[nodiscard]] bool isNull(int column) const;
@@ -41,33 +41,32 @@ public:
         sqlite3_stmt* _statement;
     };
 
-    /// Who else uses the database.
     enum class Access {
-        Exclusive, ///< with nobody: others are locked out while it is open (error SQLITE_BUSY at the first access)
-        Shared,    ///< with others that change it; waits for them, a second at most
-        ReadOnly,  ///< with others that change it; waits for nobody, and whatever the file holds, a statement ends
-                   ///< within about a second (SQLITE_INTERRUPT) and a row has 256 KiB at most (SQLITE_TOOBIG)
+        Exclusive, ///< locks other processes out while it is open; their first access fails with SQLITE_BUSY
+        Shared,    ///< other processes may write; waits up to one second for them
+        ReadOnly,  ///< other processes may write; never waits. The file is not trusted: a statement ends within about a
+                   ///< second (SQLITE_INTERRUPT), and a row has at most 256 KiB (SQLITE_TOOBIG)
     };
-    /// Opens the file, which must not be a link; its directory may lie behind one. Makes it, mode 0600, unless it is
-    /// only to be read.
+    /// Opens the file; fails if it is a symbolic link (its directory may be one). Creates it, mode 0600, unless
+    /// `access` is ReadOnly.
     [[nodiscard]] static Result<Sqlite> open(const std::filesystem::path& path, Access access = Access::Exclusive);
 
-    /// Makes the tables and indexes of an empty database by these statements, or checks that it has exactly them, made
-    /// by the same texts. Fails with kCorrupt if it has others: what another version, or another program, made.
+    /// Creates the tables and indexes of an empty database with these statements. Fails with kCorrupt if a database has
+    /// others than exactly these texts, which another version or program created.
     [[nodiscard]] Result<void> adopt(std::span<const char* const> schema);
-    /// Runs statements without parameters and results.
+    /// Runs statements that have neither parameters nor results.
     [[nodiscard]] Result<void> execute(const char* statements);
-    /// Runs one statement; `each` is called with every row. It is kept, compiled, for the next time: let it be one of a
-    /// few texts, and its values parameters.
+    /// Runs one statement and calls `each` with every row. Caches the compiled statement by its text: pass values as
+    /// parameters, not in the text.
     [[nodiscard]] Result<void> run(std::string_view statement, std::initializer_list<Parameter> parameters = {},
                                    const std::function<void(const Row&)>& each = {});
-    /// Runs `work` in a transaction, which a failure of either undoes.
+    /// Runs `work` in a transaction. Rolls back and returns the error if `work` or the commit fails.
     [[nodiscard]] Result<void> transaction(const std::function<Result<void>()>& work);
     [[nodiscard]] std::int64_t lastInsertedRow() const;
 
     static constexpr std::int64_t kCorrupt = 11; ///< SQLITE_CORRUPT
-    /// Whether an error says that the file's contents aren't, or are no longer, what was written: not a database, or
-    /// one whose tables don't fit the statements.
+    /// Returns true if an error means that the file is damaged: it is not a database, or its tables don't fit the
+    /// statements.
     [[nodiscard]] static bool isDamage(const Error& error);
 
 private:
@@ -83,7 +82,7 @@ private:
     [[nodiscard]] Statements::node_type takeStatement(std::string_view text);
 
     std::unique_ptr<sqlite3, Close> _database;
-    Statements _statements; // without those that run
+    Statements _statements; // compiled ones that are not running
 };
 
 } // namespace platform

@@ -19,7 +19,7 @@ namespace fs = std::filesystem;
 
 namespace {
 constexpr std::size_t kMaximumSize = 4u << 20;
-/// How often, and after what time each, a lock is tried that another process has.
+/// Number and interval of attempts to take a lock that another process holds.
 constexpr int kLockAttempts = 20;
 constexpr std::chrono::milliseconds kLockDelay(100);
 } // namespace
@@ -32,15 +32,15 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
     mutable std::mutex mutex; // guards all below
     Dictionary values;
     Dictionary registered;
-    std::set<std::string, std::less<>> dirty; // set here, not yet in the file
+    std::set<std::string, std::less<>> dirty; // keys that were set and are not yet in the file
     bool writeQueued = false;
     bool fileIsBroken = false;
     std::mutex writing; // one reader or writer of the file at a time; taken before `mutex`
     std::unique_ptr<FileWatch> watch;
-    int lockAttempts = 0;  // in vain, since the last write; write queue only, like the next
+    int lockAttempts = 0;  // failed ones since the last write; write queue only, like the next
     bool retrying = false; // a timer runs
 
-    /// Returns what the file has, nothing if it is missing. Fails if it can't be read or isn't a JSON object.
+    /// Returns the file's values, none if it is missing. Fails if it can't be read or isn't a JSON object.
     Result<Dictionary> readFile() const
     {
         auto bytes = files->read(path, kMaximumSize);
@@ -55,7 +55,7 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
 
     void load()
     {
-        std::lock_guard reader(writing); // what is read here must not be older than what a writer leaves
+        std::lock_guard reader(writing); // a writer must not finish between the read and the assignment below
         auto contents = readFile();
         std::lock_guard lock(mutex);
         fileIsBroken = !contents;
@@ -75,7 +75,7 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
 
     enum class Lock { Needed, Wanted };
 
-    /// On the write queue. Writes what was set, once the lock is free or was tried often enough.
+    /// Writes pending values; retries while another process holds the lock, at most `kLockAttempts` times. Write queue.
     void writeSoon()
     {
         const auto done = write(lockAttempts + 1 < kLockAttempts ? Lock::Needed : Lock::Wanted);
@@ -89,8 +89,8 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
         });
     }
 
-    /// Writes what was set over what the file has by now. Fails with EWOULDBLOCK, and has done nothing, if another
-    /// process has a lock that is needed.
+    /// Merges pending values into the file. If another process holds the lock and `need` is Needed, does nothing and
+    /// fails with EWOULDBLOCK.
     Result<void> write(Lock need)
     {
         std::lock_guard writer(writing);
@@ -100,7 +100,7 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
             if (dirty.empty()) return {};
         }
         if (auto made = files->createDirectories(path.parent_path()); !made) return writeFailed(made.error());
-        // Against others who edit the file in the same way.
+        // Guards against other processes that write the file like this.
         const auto lockFile = files->lock(path.string() + ".lock");
         if (!lockFile && need == Lock::Needed && lockFile.error().code == EWOULDBLOCK)
             return std::unexpected(lockFile.error());
@@ -133,13 +133,13 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
         return writeFailed(done.error());
     }
 
-    /// A broken file is somebody's work too: it isn't written over, but kept beside.
+    /// Renames a damaged file instead of overwriting it: the user may have edited it by hand.
     void keepAside()
     {
         std::error_code failed;
         fs::rename(path, path.string() + ".corrupt", failed);
         if (!failed)
-            defaultLog().error("user defaults {} are broken, kept as {}.corrupt", path.string(), path.string());
+            defaultLog().error("user defaults {} are damaged, kept as {}.corrupt", path.string(), path.string());
     }
 
     Result<void> writeFailed(const Error& error) const
@@ -161,7 +161,7 @@ UserDefaults::UserDefaults(FileSystem& files, fs::path path, std::shared_ptr<Que
 
 UserDefaults::~UserDefaults()
 {
-    _impl->watch.reset(); // here, on the loop's thread: a write that waits may keep the rest
+    _impl->watch.reset(); // on the loop's thread; a pending write may keep `_impl` alive
 }
 
 void UserDefaults::registerDefaults(const Dictionary& defaults)
@@ -227,7 +227,7 @@ void UserDefaults::set(std::string_view key, Value value)
     _impl->dirty.emplace(key);
     if (!_impl->writeQueue || std::exchange(_impl->writeQueued, true)) return;
     _impl->writeQueue->async([impl = _impl] {
-        if (!impl->retrying) impl->writeSoon(); // else it is written then
+        if (!impl->retrying) impl->writeSoon(); // otherwise the timer writes
     });
 }
 
@@ -250,7 +250,7 @@ Dictionary UserDefaults::contents() const
 void UserDefaults::watch(RunLoop& runLoop)
 {
     if (!_impl->files) return;
-    // Reading is handed to the write queue: the run loop's thread does no file work.
+    // The write queue reads the file: the run loop's thread does no file I/O.
     _impl->watch = std::make_unique<FileWatch>(runLoop, _impl->path, [weak = std::weak_ptr(_impl)] {
         const auto impl = weak.lock();
         if (impl && impl->writeQueue) impl->writeQueue->async([impl] { impl->load(); });

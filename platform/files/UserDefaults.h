@@ -19,51 +19,52 @@ class FileSystem;
 class Queue;
 class RunLoop;
 
-/// Small persistent settings: one suite, one JSON file, a dictionary of keys to values. Any thread.
+/// Small persistent settings: one suite, one JSON file that maps keys to values. Any thread.
 ///
-/// A key reads as what the file has, else as its registered default, else as null. The file may be edited or
-/// replaced while the process runs: it is watched, and read again. A file that can't be read or isn't a JSON object
-/// is logged and reads as empty until it is replaced; it is not overwritten before something is set.
+/// A key has the file's value, else its registered default, else null. The file may be edited or replaced while the
+/// process runs; `watch` reads it again. If it can't be read or isn't a JSON object, the error is logged and the suite
+/// is empty until the file is replaced. The next write renames such a file to "NAME.corrupt".
 ///
-/// set() is seen by readers at once and written soon, atomically, together with what else was set by then; keys that
-/// others changed in the file meanwhile are kept. A process that is killed may lose what synchronize() hasn't written.
+/// Readers see `set` at once. It is written soon, atomically, together with other keys set by then; keys that others
+/// changed in the file are kept. A kill may lose values that `synchronize` hasn't written.
 ///
-/// Whoever writes holds a lock on the file's name with ".lock" behind it. Nobody waits for it: while another process
-/// has it, a write is put off for up to two seconds; then, and in synchronize() at once, it is done without.
+/// A writer holds a lock on the file "NAME.lock". Nobody waits for it: while another process holds it, a write is
+/// delayed by up to two seconds, then done without it. `synchronize` doesn't delay.
 class UserDefaults {
 public:
-    /// A suite kept at `path`. `writeQueue` (serial) runs the writes.
+    /// Reads the suite at `path`. `writeQueue` (serial) runs the writes. `files` must outlive the queue's work.
     UserDefaults(FileSystem& files, std::filesystem::path path, std::shared_ptr<Queue> writeQueue);
-    /// A suite in memory only.
+    /// Creates a suite in memory only.
     UserDefaults();
     ~UserDefaults();
     UserDefaults(const UserDefaults&) = delete;
     UserDefaults& operator=(const UserDefaults&) = delete;
 
-    /// Values for keys that the file doesn't have. Adds to those registered before.
+    /// Adds values for keys that the file doesn't have.
     void registerDefaults(const Dictionary& defaults);
 
     [[nodiscard]] Value value(std::string_view key) const;
-    /// True for true, a number other than 0, and the texts "true", "yes" and "1" in any case; else false.
+    /// Returns true for true, a number other than 0, and the texts "true", "yes" and "1" in any case; false otherwise.
     [[nodiscard]] bool boolean(std::string_view key) const;
-    /// A non-empty string; nothing for anything else.
+    /// Returns a non-empty string, or nothing.
     [[nodiscard]] std::optional<std::string> string(std::string_view key) const;
-    /// A whole number, or a text that is one.
+    /// Returns a whole number or a text that contains one; nothing otherwise.
     [[nodiscard]] std::optional<std::int64_t> integer(std::string_view key) const;
-    /// Seconds since 1970, as set(key, Date) writes them.
+    /// Converts a number from seconds since 1970, the form in which `set` stores dates.
     [[nodiscard]] std::optional<Date> date(std::string_view key) const;
 
-    /// Dates are kept as seconds since 1970. A null removes the key.
+    /// Stores dates as seconds since 1970. Null removes the key.
     void set(std::string_view key, Value value);
     void remove(std::string_view key) { set(key, Value()); }
-    /// Writes what was set, now. Failures are logged and returned, and tried again with the next write.
+    /// Writes pending values before it returns. Logs and returns a failure; the next write retries.
     Result<void> synchronize();
-    /// Reads the file again, as the watch does.
+    /// Reads the file again.
     void reload();
-    /// What the file has (without registered defaults), for diagnostics.
+    /// Returns the file's values without registered defaults, for diagnostics.
     [[nodiscard]] Dictionary contents() const;
 
-    /// Watches the file from the run loop's thread until destroyed.
+    /// Reads the file again after each change, until this object is destroyed. Call it, and destroy this object, on the
+    /// run loop's thread.
     void watch(RunLoop& runLoop);
 
 private:
