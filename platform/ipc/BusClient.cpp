@@ -15,7 +15,7 @@ namespace platform::ipc {
 
 namespace {
 
-/// Answers of the service may be as large as sd-bus takes.
+/// Replies may be as large as sd-bus allows.
 constexpr std::size_t kMaximumAnswer = 128u << 20;
 
 std::uint64_t monotonicMicroseconds()
@@ -31,8 +31,8 @@ std::uint64_t microseconds(Duration duration)
     return count > 0 ? static_cast<std::uint64_t>(count) : 0;
 }
 
-/// Waits until the bus has something to do, `descriptor` can be read (-1 for none), a signal was handled, or the
-/// deadline has passed. Returns false if it can't wait.
+/// Blocks until the bus has work, `descriptor` is readable (-1 for none), a signal was handled, or the deadline has
+/// passed. Returns false if poll fails.
 bool waitForInput(sd_bus* bus, int descriptor, std::uint64_t now, std::uint64_t deadline)
 {
     const int events = sd_bus_get_events(bus);
@@ -45,7 +45,7 @@ bool waitForInput(sd_bus* bus, int descriptor, std::uint64_t now, std::uint64_t 
     return ppoll(watched, std::size(watched), &timeout, nullptr) >= 0 || errno == EINTR;
 }
 
-/// Decodes a received message that should have `signature`.
+/// Decodes a received message; fails if it doesn't have `signature`.
 CallResult decodeAs(sd_bus_message* message, std::string_view signature)
 {
     const char* actual = sd_bus_message_get_signature(message, true);
@@ -63,7 +63,7 @@ struct Client::Impl {
     struct BusUnref {
         void operator()(sd_bus* bus) const { sd_bus_close_unref(bus); }
     };
-    /// A call that is out; owned by its bus slot.
+    /// A call that was sent; owned by its bus slot.
     struct PendingCall {
         PendingCall(std::string signature_, Answer answer_)
             : signature(std::move(signature_)), answer(std::move(answer_))
@@ -95,7 +95,7 @@ struct Client::Impl {
 
     static int onReply(sd_bus_message* message, void* userdata, sd_bus_error*)
     {
-        // The slot goes after this, and the call with it; the answer may make new calls.
+        // sd-bus destroys the slot, and with it the call, after this returns. The answer may make new calls.
         Answer answer = std::move(static_cast<PendingCall*>(userdata)->answer);
         if (!answer) return 0;
         if (const sd_bus_error* error = sd_bus_message_get_error(message))
@@ -153,8 +153,9 @@ void Client::call(std::string_view interface, const Member& member, Message argu
     if (result < 0) return fail(std::strerror(-result));
     const auto encoded = encodeArguments(raw, member.in, arguments);
     if (!encoded) return fail(encoded.error());
-    // The service would drop the connection.
-    if (*encoded > Limits().messageSize) return fail(fmt::format("{} bytes are more than a call may have", *encoded));
+    // The service would close the connection.
+    if (*encoded > Limits().messageSize)
+        return fail(fmt::format("the call has {} bytes; the limit is {}", *encoded, Limits().messageSize));
 
     if (!answer) {
         result = sd_bus_message_set_expect_reply(raw, false);

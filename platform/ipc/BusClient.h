@@ -10,23 +10,25 @@
 
 namespace platform::ipc {
 
-/// The caller's end of a connection. Belongs to one thread; several calls may be under way at once.
+/// The client's end of a connection. One thread; several calls may be pending at once.
 class Client {
 public:
-    /// Connects to a D-Bus address ("unix:path=…"); calls go to the object at `objectPath`.
+    /// Connects to a D-Bus address ("unix:path=…"); calls go to the object at `objectPath`. Blocks until the connection
+    /// is authenticated. Fails with ECONNREFUSED if the peer closes it, and with ETIMEDOUT after `timeout`.
     [[nodiscard]] static Result<std::unique_ptr<Client>> connect(const std::string& address, std::string objectPath,
                                                                  Duration timeout);
     ~Client();
 
     using Answer = std::function<void(CallResult)>;
-    /// Sends a call. `answer`, if any, gets the answer inside a later `wait`, or an error: one of the service, one if
-    /// the call couldn't be sent, or one after `timeout`. A connection that ends drops the answers that are due.
+    /// Sends a call. A later `wait` passes the reply to `answer`, or an error: the service's, one if the call couldn't
+    /// be sent, or one after `timeout`. Without `answer` no reply is requested. If the connection ends, pending answers
+    /// are dropped.
     void call(std::string_view interface, const Member& member, Message arguments, Answer answer,
               std::optional<Duration> timeout = std::nullopt);
-    /// Sets the handler of signals, which `wait` calls: interface, member, arguments.
+    /// Sets the handler of signals (interface, member, arguments), which runs inside `wait`.
     void onSignal(std::function<void(std::string_view, std::string_view, Message)> handler);
     /// Reads and dispatches until `done()` returns true; returns false if the connection ends or `timeout` passes
-    /// before. `done` is called after whatever arrives, and whenever `descriptor` can be read, which it must read then.
+    /// first. Calls `done` after each message, and when `descriptor` becomes readable; `done` must then read from it.
     bool wait(const std::function<bool()>& done, Duration timeout, int descriptor = -1);
     [[nodiscard]] bool connected() const;
 

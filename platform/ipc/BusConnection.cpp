@@ -19,16 +19,16 @@ namespace {
 
 const Log kLog("platform", "ipc");
 
-/// Steps, of which a message takes one or two, before other connections and the loop's jobs have their turn.
+/// Steps in one go, before other connections and the loop's jobs run. A message takes one or two.
 constexpr unsigned kStepsPerTurn = 64;
 
-/// What a message costs besides its bytes, roughly: sd-bus's own record of it.
+/// Estimated bytes of sd-bus's own record of a message.
 constexpr std::size_t kMessageOverhead = 512;
 
-/// A message that is let in however much is held already: everybody may have a call under way.
+/// A message of at most this size is accepted even at the limits, so that every connection can have one pending call.
 constexpr std::size_t kSmallMessage = 4u << 10;
 
-/// What the decoded arguments of a message may take, in sizes of the message.
+/// How many times its size the decoded arguments of a message may take.
 constexpr std::size_t kDecodedShare = 2;
 
 bool isDisconnect(int result)
@@ -37,7 +37,7 @@ bool isDisconnect(int result)
            result == -ESTALE;
 }
 
-/// Why sd-bus failed, for `end`; empty if the peer just went.
+/// Returns why sd-bus failed, for `end`; empty if the peer disconnected.
 std::string_view describe(int result)
 {
     return isDisconnect(result) ? std::string_view() : std::strerror(-result);
@@ -67,7 +67,7 @@ bool BusContext::admits(pid_t process, std::size_t bytes)
     return admitted;
 }
 
-/// What the connection's owner holds: hands every operation to the loop.
+/// The owner's end: posts every operation to the loop.
 class BusConnection::Handle final : public Connection {
 public:
     explicit Handle(std::shared_ptr<BusConnection> core) : _core(std::move(core)) {}
@@ -147,7 +147,7 @@ void BusConnection::start()
     sd_bus* bus = nullptr;
     sd_id128_t serverId;
     int result = sd_bus_new(&bus);
-    if (result < 0) return end("there is no memory for it");
+    if (result < 0) return end("out of memory");
     _bus.reset(bus);
     if (result >= 0) result = sd_id128_randomize(&serverId);
     if (result >= 0) result = sd_bus_set_server(bus, true, serverId);
@@ -190,7 +190,7 @@ void BusConnection::push(std::string_view signal, const Message& arguments)
     const std::string listener(_interface->listenerName);
     const std::string name(signal);
     if (sd_bus_message_new_signal(_bus.get(), &message, _interface->path.c_str(), listener.c_str(), name.c_str()) < 0)
-        return pushFailed(fmt::format("{} can't be made", signal));
+        return pushFailed(fmt::format("{} can't be created", signal));
     const BusMessage owned(message);
     auto size = encodeArguments(message, member->in, arguments);
     if (!size) return pushFailed(fmt::format("{} can't be sent: {}", signal, size.error()));
@@ -220,7 +220,7 @@ void BusConnection::invalidate()
 bool BusConnection::paused() const
 {
     if (_state != State::Open) return true;
-    // A peer that has gone can add nothing: what it left in the socket is bounded by the kernel.
+    // A disconnected peer can't send more, and the kernel bounds what is left in the socket.
     if (_peerGone) return false;
     const Limits& limits = _context->limits;
     return _heldBack || _calls.size() >= limits.callsInFlight || _bytesInFlight >= limits.bytesInFlight ||
@@ -242,7 +242,7 @@ void BusConnection::drive(bool writable)
     _heldBack = false;
     for (unsigned step = 0; step < kStepsPerTurn; ++step) {
         if (_state == State::Closed) return;
-        if (sd_bus_is_open(_bus.get()) <= 0) return end({}); // before sd-bus closes the descriptor that is watched
+        if (sd_bus_is_open(_bus.get()) <= 0) return end({}); // before sd-bus closes the watched descriptor
         if (!std::exchange(writable, false) && !_fed) {
             if (!feed()) return;
             continue;
@@ -254,11 +254,11 @@ void BusConnection::drive(bool writable)
         settleWriteQueue(kMessageOverhead);
         if (_state == State::Draining && _unwritten.empty()) return close();
         if (result > 0) {
-            if (_authenticated && !_messageDue) _fed = false; // spares sd-bus a read that finds nothing
+            if (_authenticated && !_messageDue) _fed = false; // saves sd-bus a read that returns nothing
             continue;
         }
         _fed = false;
-        if (_messageDue && _input->betweenMessages()) return end("it sent what is no message");
+        if (_messageDue && _input->betweenMessages()) return end("it sent an invalid message");
         if (!_authenticated && sd_bus_is_ready(_bus.get()) > 0) {
             _authenticated = true;
             cancelTimer();
@@ -267,7 +267,7 @@ void BusConnection::drive(bool writable)
     driveAgainLater();
 }
 
-/// Gives sd-bus more of what the peer sent; false if there is nothing to give now. The connection may have ended then.
+/// Passes more of the peer's input to sd-bus. Returns false if nothing can be passed now, or if the connection ended.
 bool BusConnection::feed()
 {
     const bool mayPass = !_authenticated || !_input->betweenMessages() || announceMessage();
@@ -279,12 +279,12 @@ bool BusConnection::feed()
         return true;
     case BusInput::Outcome::Empty: waitForMore(); return false;
     case BusInput::Outcome::Ended: end({}); return false;
-    case BusInput::Outcome::Malformed: end("it doesn't speak the protocol"); return false;
+    case BusInput::Outcome::Malformed: end("it sent no D-Bus authentication"); return false;
     }
     return false;
 }
 
-/// Looks at the next message and reserves what it may cost; false if it has to wait, or hasn't come.
+/// Reads the next message's header and reserves its bytes. Returns false if it must wait, or has not arrived.
 bool BusConnection::announceMessage()
 {
     if (paused()) {
@@ -296,7 +296,7 @@ bool BusConnection::announceMessage()
     case BusInput::Outcome::Passed: break;
     case BusInput::Outcome::Empty: waitForMore(); return false;
     case BusInput::Outcome::Ended: end({}); return false;
-    case BusInput::Outcome::Malformed: end("it sent what is no message"); return false;
+    case BusInput::Outcome::Malformed: end("it sent an invalid message"); return false;
     }
     const std::size_t size = _input->announced();
     if (size > _context->limits.messageSize) {
@@ -305,7 +305,7 @@ bool BusConnection::announceMessage()
     }
     const std::size_t cost = size * (1 + kDecodedShare);
     if (size > kSmallMessage && !_context->admits(_peer.pid, cost)) {
-        if (_peerGone) end("there is no room for what it sent last");
+        if (_peerGone) end("its last message exceeds the limits");
         _heldBack = true;
         updateWatch();
         return false;
@@ -392,13 +392,13 @@ void BusConnection::receive(sd_bus_message* message, const Member& member)
             send(answer.get(), decoded.error().message.size());
         return;
     }
-    // The message is kept for its answer, with its body.
+    // The message is kept, with its body, until the reply.
     const std::size_t size = _receiving / (1 + kDecodedShare) + decoded->size + kMessageOverhead;
     const std::uint64_t id = ++_lastCall;
     hold(_bytesInFlight, _bytesInFlight + size);
     _calls.emplace(id, PendingCall{&member, size, BusMessage(sd_bus_message_ref(message))});
 
-    // The task makes the responder: a task that never runs owes no answer.
+    // The task creates the responder: a task that never runs owes no reply.
     _queue->async([self = shared_from_this(), handler = _handler, id, name = member.name,
                    arguments = std::move(decoded->message)]() mutable {
         RunLoop& loop = self->_context->loop;
@@ -456,8 +456,8 @@ BusMessage BusConnection::encodeAnswer(const PendingCall& call, CallResult resul
             size = *encoded;
             return owned;
         }
-        kLog.fault("the answer to {} can't be sent: {}", call.member->name, encoded.error());
-        result = std::unexpected(CallError{SD_BUS_ERROR_FAILED, "the answer can't be sent: " + encoded.error()});
+        kLog.fault("the reply to {} can't be sent: {}", call.member->name, encoded.error());
+        result = std::unexpected(CallError{SD_BUS_ERROR_FAILED, "the reply can't be sent: " + encoded.error()});
     }
     size = result.error().message.size();
     return makeErrorAnswer(call.message.get(), result.error());
@@ -465,7 +465,7 @@ BusMessage BusConnection::encodeAnswer(const PendingCall& call, CallResult resul
 
 void BusConnection::send(sd_bus_message* message, std::size_t size)
 {
-    // Writing to a peer that has gone would make sd-bus forget what that peer sent before it went.
+    // Writing to a disconnected peer would make sd-bus drop the peer's last input.
     if (_state != State::Open || peerHasGone()) return;
     sd_bus_message_set_sender(message, kOwnName);
     if (!sd_bus_message_get_destination(message)) sd_bus_message_set_destination(message, kPeerName);
@@ -479,7 +479,7 @@ void BusConnection::send(sd_bus_message* message, std::size_t size)
     relieve();
 }
 
-/// While more waits to be read by peers than may, ends the connection that the most waits for.
+/// Ends the connection with the most unread bytes until all together are within the limit.
 void BusConnection::relieve()
 {
     while (_context->unread > _context->limits.unreadBytes) {
@@ -489,7 +489,7 @@ void BusConnection::relieve()
     }
 }
 
-/// Brings the account up to date with sd-bus's write queue. Messages that are new there count as `sizeOfNewest` each.
+/// Updates the count of unwritten bytes from sd-bus's write queue. Each new message there counts as `sizeOfNewest`.
 void BusConnection::settleWriteQueue(std::size_t sizeOfNewest)
 {
     std::uint64_t queued = 0;
@@ -519,7 +519,7 @@ void BusConnection::updateWatch()
     if (!_watch || _state == State::Closed) return;
     const int wanted = sd_bus_get_events(_bus.get());
     if (wanted < 0) return driveAgainLater();
-    // The peer's end is of interest even while nothing is to be read.
+    // Watches for a disconnect even while it doesn't read.
     std::uint32_t events = static_cast<std::uint32_t>(wanted) | EPOLLHUP;
     const bool reads = !_authenticated || !_input->betweenMessages() || !paused();
     if (reads)
@@ -555,7 +555,7 @@ void BusConnection::announceEnd()
     if (_invalidationHandler) _queue->async(std::exchange(_invalidationHandler, {}));
 }
 
-/// Ends the connection. Logs `reason`, which is empty if the peer just went.
+/// Ends the connection. Logs `reason`, which is empty if the peer disconnected.
 void BusConnection::end(std::string_view reason)
 {
     if (_state == State::Closed) return;
@@ -572,7 +572,7 @@ void BusConnection::close()
     hold(_receiving, 0);
     setUnwritten(0);
     if (_watch) _watch->setEvents(0);
-    // Later, because sd-bus's objects and the watch must not be destroyed inside their own callbacks.
+    // Posted: sd-bus's objects and the watch must not be destroyed inside their own callbacks.
     _context->loop.execute(Priority::Default, [self = shared_from_this()] { self->dispose(); });
 }
 

@@ -22,19 +22,21 @@ namespace platform::ipc {
 
 class BusConnection;
 
-/// What the parts of one transport share, and the account of what peers make it hold. Loop's thread.
+/// The state that the parts of one transport share, and the count of bytes that peers make it hold (`Limits`). Loop's
+/// thread.
 struct BusContext {
     struct Process {
         unsigned connections = 0;
         std::size_t bytes = 0;
-        bool refused = false; ///< one was refused since the last one closed
+        bool refused = false; ///< a connection was refused since the last one closed
     };
 
-    /// A part of what `process` makes the transport hold was `before` bytes, and is `now`.
+    /// Counts a change: a part of the bytes of `process` was `before` bytes and is `now` bytes.
     void hold(pid_t process, std::size_t before, std::size_t now);
-    /// Whether so much is held, by all or by `process`, that its further calls have to wait.
+    /// Returns true if `process`, or all together, reached a limit: its further calls must wait.
     [[nodiscard]] bool full(pid_t process);
-    /// Whether there is room for as much more of `process`. Who is told no is driven again once there is more room.
+    /// Returns true if `bytes` more of `process` fit. After false, all connections are driven again once bytes are
+    /// freed.
     [[nodiscard]] bool admits(pid_t process, std::size_t bytes);
 
     RunLoop& loop;
@@ -43,31 +45,31 @@ struct BusContext {
     const Limits limits;
     std::set<std::shared_ptr<BusConnection>> connections{}; ///< those not closed yet
     std::map<pid_t, Process> processes{};                   ///< those with connections
-    std::size_t held = 0;                                   ///< by all processes
-    std::size_t unread = 0;                                 ///< of `held`: what waits to be read by peers
-    bool starved = false;                                   ///< somebody waits for room
+    std::size_t held = 0;                                   ///< bytes of all processes
+    std::size_t unread = 0;                                 ///< the part of `held` that peers have not read
+    bool starved = false;                                   ///< a connection waits for bytes to be freed
 };
 
-/// The loop's side of one server connection: an sd-bus object and what is on its way through it.
+/// The loop's side of one server connection: an sd-bus object, its pending calls and its unwritten output.
 ///
 ///     call: socket → BusInput (limits) → sd-bus → onMessage (decode) → queue: handler
 ///     answer: any thread → loop: answer (encode) → sd-bus → [its write queue] → socket
 ///
-/// Waiting until `start`; Open; Draining after a local end while queued output is still being written; Closed. The
-/// context keeps it alive until Closed. Everything but `handle` belongs to the loop's thread.
+/// States: Waiting until `start`; Open; Draining after `invalidate` until queued output is written; Closed. The context
+/// owns the connection until Closed. Loop's thread, except for `handle`.
 class BusConnection final : public std::enable_shared_from_this<BusConnection> {
 public:
-    /// Takes over a connected socket. `closed` is called once, on the loop.
+    /// Takes ownership of a connected socket. `closed` runs once, on the loop.
     static std::shared_ptr<BusConnection> make(std::shared_ptr<BusContext> context,
                                                std::shared_ptr<const Interface> interface, FileHandle socket, Peer peer,
                                                std::shared_ptr<Queue> queue, std::function<void()> closed);
     ~BusConnection();
 
-    /// The connection for its acceptor, whose release ends the connection. Called once.
+    /// Returns the connection for its acceptor; releasing it ends the connection. Call it once.
     [[nodiscard]] std::shared_ptr<Connection> handle();
-    /// Closes at once, dropping what was not written; for the transport's own end.
+    /// Closes at once and drops unwritten output; for the destructor of the transport.
     void abandon();
-    /// Goes on with what was held back.
+    /// Posts another `drive`, which reads input that was held back.
     void driveAgainLater();
 
 private:
@@ -76,7 +78,7 @@ private:
         void operator()(sd_bus* bus) const;
     };
     enum class State { Waiting, Open, Draining, Closed };
-    /// A call that the handler hasn't answered yet.
+    /// A call without a reply yet.
     struct PendingCall {
         const Member* member;
         std::size_t size;
@@ -86,7 +88,7 @@ private:
     BusConnection(std::shared_ptr<BusContext> context, std::shared_ptr<const Interface> interface, FileHandle socket,
                   Peer peer, std::shared_ptr<Queue> queue, std::function<void()> closed);
 
-    // the owner's operations, each a job on the loop
+    // the owner's operations, each of them a job on the loop
     void start();
     void push(std::string_view signal, const Message& arguments);
     void pushFailed(const std::string& reason) const;
@@ -134,11 +136,11 @@ private:
     std::shared_ptr<const Handler> _handler;
     std::move_only_function<void()> _invalidationHandler;
     std::function<void(const std::string&)> _pushErrorHandler;
-    std::atomic<bool> _silenced = false; // no call is to reach the handler any more
+    std::atomic<bool> _silenced = false; // the handler gets no more calls
 
     State _state = State::Waiting;
-    FileHandle _socket;             // until sd-bus has it
-    int _fd = -1;                   // of the peer's socket, which sd-bus writes to and owns
+    FileHandle _socket;             // until sd-bus owns it
+    int _fd = -1;                   // the peer's socket, which sd-bus writes to and owns
     std::optional<BusInput> _input; // from `start`
     std::unique_ptr<sd_bus, BusUnref> _bus;
     std::unique_ptr<RunLoop::Watch> _watch;
@@ -146,14 +148,14 @@ private:
     bool _peerGone = false;
     bool _driveQueued = false;
     bool _authenticated = false;
-    bool _fed = false;        // sd-bus hasn't said yet that it has read all that it was given
-    bool _messageDue = false; // sd-bus was given some of a message, and hasn't handed it out
-    bool _heldBack = false;   // the next message waits for room
+    bool _fed = false;        // sd-bus may have unread input
+    bool _messageDue = false; // sd-bus has part of a message and has not delivered it
+    bool _heldBack = false;   // the next message waits until bytes are freed
     Clock::TimerId _timer = 0;
 
     std::unordered_map<std::uint64_t, PendingCall> _calls;
     std::uint64_t _lastCall = 0;
-    std::size_t _receiving = 0; // what the message under way may cost
+    std::size_t _receiving = 0; // bytes reserved for the current message
     std::size_t _bytesInFlight = 0;
     std::deque<std::size_t> _unwritten; // sizes of the messages in sd-bus's write queue
     std::size_t _unwrittenBytes = 0;

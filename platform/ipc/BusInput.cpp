@@ -11,7 +11,7 @@ namespace platform::ipc {
 
 namespace {
 
-/// Bytes of a large message that are passed in one step; an empty pair has room for them.
+/// Bytes of a large message that are passed in one step; they fit into the buffer of an empty pair.
 constexpr std::size_t kStep = 64u << 10;
 
 std::uint32_t numberAt(std::span<const char, kFixedHeader> header, std::size_t offset)
@@ -40,7 +40,7 @@ std::optional<std::uint64_t> messageSize(std::span<const char, kFixedHeader> hea
 
 BusInput::Outcome BusInput::fill()
 {
-    // The socket's next event tells of what comes later.
+    // The socket was empty: its next event reports more input.
     if (std::exchange(_drained, false)) return Outcome::Empty;
     std::array<char, kReadAhead> bytes;
     const std::size_t room = bytes.size() - _buffer.size();

@@ -16,16 +16,16 @@ namespace platform::ipc {
 
 namespace {
 
-/// Bytes of a value in a message, at least.
+/// The least that a value counts for in a message, in bytes.
 constexpr std::size_t kSmallestValue = 8;
 
-// What decoded values take in memory, with what containers and the allocator add: more than in the message.
+// Estimated memory of decoded values in bytes, with the overhead of containers and the allocator.
 constexpr std::size_t kScalarCost = 2 * sizeof(Value);
 constexpr std::size_t kTextCost = 128;
 constexpr std::size_t kContainerCost = 192;
 constexpr std::size_t kKeyCost = 96;
 
-/// Reads one message front to back. The first failure sticks; from then on reads answer null.
+/// Reads one message from start to end. After the first failure all reads return null.
 class ArgumentReader {
 public:
     ArgumentReader(sd_bus_message* bus, std::size_t maximumSize) : _bus(bus), _maximumSize(maximumSize) {}
@@ -96,10 +96,10 @@ private:
         case SD_BUS_TYPE_VARIANT: return variant(contents);
         case SD_BUS_TYPE_ARRAY:
             if (std::string_view(contents) == "y") return bytes();
-            // The view of the contents dies with the next call.
+            // `contents` is valid until the next call of sd-bus, so it is copied.
             return contents[0] == '{' ? dictionary(std::string(contents), inVariant)
                                       : array(std::string(contents), inVariant);
-        default: return fail(fmt::format("values of type '{}' are not taken", type));
+        default: return fail(fmt::format("values of type '{}' are not supported", type));
         }
     }
 
@@ -176,15 +176,16 @@ private:
     std::optional<CallError> _error;
 };
 
-/// False for every text that a bus message can't hold, and for some that it can.
+/// Returns true only for texts that a bus message can contain; returns false for a few that it can, too.
 bool isBusText(const std::string& text)
 {
-    // The UTF-8 forms of noncharacters, U+FFFF and its kind, have one of these in them.
+    // The UTF-8 form of every noncharacter, such as U+FFFF, contains one of these sequences.
     return simdjson::validate_utf8(text) && text.find('\0') == std::string::npos && !text.contains("\xef\xb7") &&
            !text.contains("\xbf\xbe") && !text.contains("\xbf\xbf");
 }
 
-/// Appends arguments one complete type at a time. False, once, is the end: `reason` says why.
+/// Appends arguments one complete type at a time. After `append` has returned false, `reason` says why and the message
+/// is unusable.
 class ArgumentWriter {
 public:
     ArgumentWriter(sd_bus_message* bus, const std::vector<FileHandle>& handles) : _bus(bus), _handles(handles) {}
@@ -320,7 +321,7 @@ private:
     std::size_t _size = 0;
 };
 
-/// The length of the first complete type of a signature of this layer: basic types, "v", "a{sv}", and arrays of these.
+/// Returns the length of the first complete type of a signature: a basic type, "v", "a{sv}", or an array of these.
 std::size_t firstType(std::string_view signature)
 {
     constexpr std::string_view kDictionary = "a{sv}";
@@ -352,7 +353,7 @@ std::expected<std::size_t, std::string> encodeArguments(sd_bus_message* bus, std
         if (!writer.append(type, message.args[index]))
             return std::unexpected(fmt::format("argument {}: {}", index + 1, writer.reason));
     }
-    if (index < message.args.size()) return std::unexpected(fmt::format("argument {} is one too many", index + 1));
+    if (index < message.args.size()) return std::unexpected(fmt::format("argument {} is not expected", index + 1));
     return writer.size();
 }
 

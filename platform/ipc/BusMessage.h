@@ -9,7 +9,7 @@
 
 struct sd_bus_message;
 
-/// Encodes and decodes the arguments of bus messages. Only on the thread of the message's bus.
+/// Encodes and decodes the arguments of bus messages. Call these only on the thread that uses the message's bus.
 namespace platform::ipc {
 
 struct BusMessageUnref {
@@ -20,27 +20,25 @@ using BusMessage = std::unique_ptr<sd_bus_message, BusMessageUnref>;
 
 struct DecodedArguments {
     Message message;
-    std::size_t size = 0; ///< bytes of memory, roughly
+    std::size_t size = 0; ///< estimated bytes of memory
 };
 
-/// File handles that one message may carry; more are refused.
+/// The most file handles that one message may carry.
 inline constexpr std::size_t kMaximumHandles = 16;
 
-/// Reads all arguments of a received message by its own signature. Variants may hold what a Value can: numbers, texts,
-/// byte strings, arrays, dictionaries with string keys. File handles are duplicated; variants can't hold them.
-/// The error names the argument; it is LimitsExceeded past `maximumSize`.
+/// Reads all arguments of a received message by the message's signature. Variants may contain numbers, texts, byte
+/// strings, arrays, and dictionaries with string keys. File handles are duplicated; a variant can't contain one. The
+/// error names the argument; it is LimitsExceeded if the values take more than `maximumSize` bytes.
 [[nodiscard]] std::expected<DecodedArguments, CallError> decodeArguments(sd_bus_message* message,
                                                                          std::size_t maximumSize);
 
-/// Appends `message` to a new bus message by `signature` and returns its size there, roughly. A null argument
-/// travels as its type's zero; null entries of dictionaries are left out, null elements
-/// of arrays travel as empty dictionaries; texts are repaired by `busText`. Fails,
-/// naming the argument, if a value doesn't fit its type; the bus message is useless then.
+/// Appends `message` to a new bus message by `signature` and returns its estimated size in bytes. A null argument is
+/// sent as the zero of its type; see `Message` for null inside containers. Texts pass through `busText`. If a value
+/// doesn't fit its type, returns an error that names the argument; the bus message is then unusable.
 [[nodiscard]] std::expected<std::size_t, std::string> encodeArguments(sd_bus_message* bus, std::string_view signature,
                                                                       const Message& message);
 
-/// `text`, fit for a bus message: U+FFFD stands for what is no UTF-8, for U+0000, and for noncharacters, which sd-bus
-/// refuses.
+/// Replaces invalid UTF-8, U+0000 and noncharacters, which sd-bus rejects, by U+FFFD.
 [[nodiscard]] std::string busText(std::string_view text);
 
 } // namespace platform::ipc

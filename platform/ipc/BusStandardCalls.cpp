@@ -10,13 +10,13 @@ namespace platform::ipc {
 
 namespace {
 
-constexpr unsigned kAlreadyRunning = 2; // what StartServiceByName says of a service that runs
+constexpr unsigned kAlreadyRunning = 2; // DBUS_START_REPLY_ALREADY_RUNNING
 
 constexpr std::string_view kDoctype =
     "<!DOCTYPE node PUBLIC \"-//freedesktop//DTD D-BUS Object Introspection 1.0//EN\"\n"
     " \"http://www.freedesktop.org/standards/dbus/1.0/introspect.dtd\">\n";
 
-/// An answer with these values; null if there is no memory.
+/// Returns a reply with these values; null if sd-bus is out of memory.
 template <class... Values> BusMessage makeAnswer(sd_bus_message* call, const char* signature = "", Values... values)
 {
     sd_bus_message* answer = nullptr;
@@ -26,7 +26,7 @@ template <class... Values> BusMessage makeAnswer(sd_bus_message* call, const cha
     return owned;
 }
 
-/// The name of the child of `path` that leads to the object at `below`; empty if that isn't below `path`.
+/// Returns the name of the child of `path` that leads to the object at `below`; empty if `below` is not below `path`.
 std::string_view childTowardsObject(std::string_view path, std::string_view below)
 {
     if (path != "/") {
@@ -46,7 +46,7 @@ BusMessage introspect(sd_bus_message* call, std::string_view path, const Interfa
     return makeAnswer(call, "s", fmt::format("{}<node>\n <node name=\"{}\"/>\n</node>\n", kDoctype, child).c_str());
 }
 
-/// There are no properties.
+/// Replies that the object has no properties.
 BusMessage properties(sd_bus_message* call, std::string_view member)
 {
     const char* interface = nullptr;
@@ -58,7 +58,7 @@ BusMessage properties(sd_bus_message* call, std::string_view member)
     return {};
 }
 
-/// What a client of a message bus says to the bus: it greets, and it may ask who is there.
+/// Replies to the calls that clients send to a message bus.
 BusMessage messageBus(sd_bus_message* call, std::string_view member)
 {
     if (member == "Hello") return makeAnswer(call, "s", kPeerName);

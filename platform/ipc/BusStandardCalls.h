@@ -2,20 +2,20 @@
 
 #include "platform/ipc/BusMessage.h"
 
-/// The calls that every D-Bus object answers, so that tools and the bindings of other languages can connect here as
-/// they do to a message bus: Introspect, Properties, Peer, and of the bus itself what clients ask before anything else.
-/// All bus names are taken for this service's, and it counts as running.
+/// The calls that every D-Bus object supports, and those that clients send to a message bus first (Hello, AddMatch, …),
+/// so that tools and bindings of other languages can connect as they do to a message bus. Every bus name counts as this
+/// service's, and the service counts as running.
 namespace platform::ipc {
 
-/// The unique names of the two ends, as on a message bus. Every message to a peer carries both: bindings drop signals
-/// without a sender, or take their own name from the answer to Hello. Each peer has a bus of its own.
+/// The unique names of the two ends, as on a message bus with one peer. Every message to a peer has both: some bindings
+/// drop signals without a sender, others take their own name from the reply to Hello.
 inline constexpr const char* kOwnName = ":1.0";
 inline constexpr const char* kPeerName = ":1.1";
 
-/// The answer to such a call, ready to send; null for any other call.
+/// Returns the reply to a standard call, ready to send; null for any other call.
 [[nodiscard]] BusMessage answerStandardCall(sd_bus_message* call, const Interface& interface);
 
-/// An error as the answer to `call`; null without memory.
+/// Returns an error reply to `call`; null if sd-bus is out of memory. An invalid error name becomes "Failed".
 [[nodiscard]] BusMessage makeErrorAnswer(sd_bus_message* call, const CallError& error);
 
 } // namespace platform::ipc

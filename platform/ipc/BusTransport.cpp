@@ -19,13 +19,13 @@ const Log kLog("platform", "ipc");
 
 constexpr std::string_view kEndpointPrefix = "endpoint-";
 
-/// Connections accepted before the loop's other work has its turn.
+/// Connections accepted in one go, before the loop's other work runs.
 constexpr int kAcceptsPerTurn = 16;
 
-/// How soon to try again if the process or the system has no descriptor left.
+/// When to retry after accept failed for lack of descriptors or memory.
 constexpr Duration kAcceptRetry = std::chrono::seconds(1);
 
-/// The loop's side of a listener: accepts until its listener is gone. Loop's thread, except for `retire` and what comes
+/// The loop's side of a listener; accepts until the listener is destroyed. Loop's thread, except for `retire` and calls
 /// before `start`.
 class Acceptance : public std::enable_shared_from_this<Acceptance> {
 public:
@@ -37,7 +37,7 @@ public:
     [[nodiscard]] BusContext& context() const { return *_context; }
     [[nodiscard]] std::string endpoint() const { return busAddress(_socket.path()); }
 
-    /// Before `start`.
+    /// Call before `start`.
     void setAcceptor(Listener::Acceptor acceptor) { _acceptor = std::move(acceptor); }
 
     void start()
@@ -48,7 +48,7 @@ public:
         });
     }
 
-    /// Removes the path and stops accepting; `stop` follows. Any thread.
+    /// Removes the path and stops accepting; call `stop` next. Any thread.
     void retire()
     {
         _retired = true;
@@ -66,7 +66,7 @@ private:
     {
         for (int turn = 0; turn < kAcceptsPerTurn && !_retired; ++turn) {
             if (_open >= _context->limits.connections) {
-                kLog.info("{}: {} connections are open, others wait", _label, _open);
+                kLog.info("{}: {} connections are open; new ones wait", _label, _open);
                 return pause(true);
             }
             FileHandle socket(accept4(_socket.fd(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
@@ -94,7 +94,7 @@ private:
         const pid_t pid = credentials->pid;
         const auto process = _context->processes.try_emplace(pid).first;
         if (process->second.connections >= _context->limits.connectionsPerProcess) {
-            if (!std::exchange(process->second.refused, true)) // once, however often it tries
+            if (!std::exchange(process->second.refused, true)) // logs once, however often the process tries
                 kLog.error("{}: refused process {}: it has {} connections", _label, pid, process->second.connections);
             return;
         }
@@ -165,7 +165,7 @@ private:
     const std::string _endpoint;
 };
 
-/// In place of an endpoint that couldn't be made.
+/// Replaces a listener that could not be created. Its endpoint is empty.
 class DeafListener final : public Listener {
 public:
     void setAcceptor(Acceptor) override {}
@@ -200,7 +200,7 @@ public:
     {
         auto socket = ListenSocket::bindUnguessable(_directory, kEndpointPrefix);
         if (socket) return make(interface, label, std::move(*socket));
-        kLog.error("{}: no endpoint: {}", label, socket.error().description());
+        kLog.error("{}: can't create an endpoint: {}", label, socket.error().description());
         return std::make_unique<DeafListener>();
     }
 

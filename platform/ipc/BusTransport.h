@@ -12,9 +12,11 @@ class RunLoop;
 
 namespace platform::ipc {
 
-/// A transport on D-Bus that listens in `directory`, and first removes the endpoints that earlier processes left there.
-/// The `label` of a listener names its connections' queues. The run loop, executor and clock must outlive the transport
-/// and what it makes. Destroying it, on the loop's thread or after the loop has stopped, ends all connections.
+/// Returns a D-Bus transport whose sockets are in `directory`. First removes endpoints that dead processes left there.
+///
+/// A listener's `label` becomes the label of its connections' queues. The run loop, executor and clock must outlive the
+/// transport and its listeners and connections. Destroy it on the loop's thread or after the loop has stopped; that
+/// ends all connections.
 [[nodiscard]] std::unique_ptr<Transport> makeBusTransport(RunLoop& runLoop, Executor& executor, Clock& clock,
                                                           std::filesystem::path directory, Limits limits = {});
 

@@ -47,7 +47,7 @@ FileHandle streamSocket()
 
 enum class Occupant { None, Dead, Alive, NotASocket };
 
-/// Who is at a socket path. A listener whose backlog is full counts as alive.
+/// Returns what is at a socket path. A listener with a full backlog counts as alive.
 Result<Occupant> occupantOf(const std::filesystem::path& path)
 {
     struct stat status{};
@@ -72,7 +72,7 @@ Result<FileHandle> bindAndListen(const std::filesystem::path& path)
     auto address = addressOf(path);
     if (!address) return std::unexpected(std::move(address.error()));
     FileHandle socket = streamSocket();
-    // The mode set before is the mode of the file that bind makes: there is no moment with a wider one.
+    // bind creates the file with the socket's mode, so the file never has a wider one.
     if (!socket || fchmod(socket.fd(), 0600) != 0 || bind(socket.fd(), asSockaddr(*address), sizeof(*address)) != 0 ||
         listen(socket.fd(), SOMAXCONN) != 0)
         return failure(errno, path);
@@ -145,7 +145,7 @@ std::optional<ListenSocket> ListenSocket::fromServiceManager()
         FileHandle socket(fd);
         fcntl(fd, F_SETFL, fcntl(fd, F_GETFL) | O_NONBLOCK);
         sockaddr_un address{};
-        socklen_t length = sizeof(address) - 1; // the kernel needn't end the path
+        socklen_t length = sizeof(address) - 1; // the kernel may not terminate the path
         if (getsockname(fd, reinterpret_cast<sockaddr*>(&address), &length) != 0) continue;
         return ListenSocket(std::move(socket), address.sun_path, false);
     }
@@ -176,7 +176,7 @@ void sweepDeadSockets(const std::filesystem::path& directory, std::string_view p
          entry.increment(error)) {
         if (!entry->path().filename().native().starts_with(prefix)) continue;
         if (occupantOf(entry->path()) != Occupant::Dead) continue;
-        kLog.info("removing {}, left by a process that is gone", entry->path().native());
+        kLog.info("removing {}, the socket of a dead process", entry->path().native());
         unlink(entry->path().c_str());
     }
 }

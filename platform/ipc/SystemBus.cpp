@@ -13,10 +13,10 @@ namespace platform::ipc {
 namespace {
 
 constexpr const char* kProperties = "org.freedesktop.DBus.Properties";
-/// Far beyond any answer of the services that are asked.
+/// Far more than any reply of the services in use.
 constexpr std::size_t kMaximumAnswer = 1u << 20;
 
-/// Null stands for a call that could not be sent.
+/// Returns the error of a reply, or nothing. `message` is null if the call could not be sent.
 std::optional<CallError> errorOf(sd_bus_message* message)
 {
     if (!message) return CallError{.name = SD_BUS_ERROR_DISCONNECTED, .message = "no message bus"};
@@ -33,7 +33,7 @@ CallResult argumentsOf(sd_bus_message* message)
     return std::move(decoded->message);
 }
 
-/// Reads a variant of a type that some property in use has; skips others and returns null.
+/// Reads a variant of type b, u or d, which the properties in use have; skips others and returns null.
 Value readVariant(sd_bus_message* message)
 {
     const char* type = nullptr;
@@ -188,7 +188,7 @@ void SystemBus::send(BusMessage call, Receiver receive_)
         return (*receiver)(nullptr);
     own(slot, std::move(receiver));
     sd_bus_slot_set_floating(slot, true);
-    sd_bus_slot_unref(slot); // the bus keeps it until the answer
+    sd_bus_slot_unref(slot); // a floating slot: the bus owns it until the reply
 }
 
 } // namespace platform::ipc
