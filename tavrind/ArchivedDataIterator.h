@@ -17,7 +17,8 @@ public:
 
     /// Returns whether a length fits before the end. No record need follow it.
     [[nodiscard]] bool hasMore() const { return _position + kLengthSize <= _data.size(); }
-    /// Returns the next record's archive. At the end or at a broken record, logs why, returns nothing and stays.
+    /// Returns the next record's archive, which is valid as long as the iterator. At the end or at a broken record,
+    /// logs the reason, returns nothing and does not advance.
     [[nodiscard]] std::optional<std::string_view> readNextObject();
     /// Moves to the first broken record or the end, without a log line, and returns the number of records passed.
     std::uint64_t countRecords();
@@ -29,7 +30,7 @@ public:
     static constexpr std::uint64_t kLengthSize = sizeof(std::uint64_t);
 
 private:
-    /// Moves past the next record and returns its archive, or says why it can't.
+    /// Moves past the next record and returns its archive. Returns the reason if that fails.
     std::expected<std::string_view, const char*> _next();
 
     platform::Bytes _data;

@@ -27,7 +27,7 @@ constexpr const char* kActivity = "com.quorvane.tavrind.flusher.background";
 constexpr std::chrono::seconds kDelay = 300s;
 constexpr std::chrono::seconds kInterval = 600s;
 constexpr std::chrono::seconds kGracePeriod = 300s;
-/// No body takes that long to write.
+/// Age at which the file of a body counts as abandoned: no body takes that long to write.
 constexpr std::chrono::hours kOldBody(1);
 
 const platform::Log& log()
@@ -115,9 +115,9 @@ void BackgroundActivitiesManager::_flusherActivity()
         _assembly.persistentStorage->deleteSessionWithFileContainer(container);
         _assembly.feedbackBooks.move(FeedbackFate::Closed, fate, lost);
         if (!session) continue;
-        // A process that is killed from here on loses this session; it never sends it twice.
+        // From here on, a kill loses this session but never sends it twice.
         _assembly.persistentStorage->syncDeletions();
-        // The events are in memory again, until they are in an upload.
+        // The events are in memory until they are part of an upload.
         _assembly.feedbackBooks.move(FeedbackFate::Closed, FeedbackFate::Open, session->recordedEvents());
         _feedbackFlusher->flushSyncFromArray({session});
         _flushToWire(*_feedbackFlusher);
@@ -126,8 +126,8 @@ void BackgroundActivitiesManager::_flusherActivity()
     _assembly.feedbackBooks.save();
 }
 
-/// Removes the bodies of processes that were killed while they wrote them: they hold users' events. A young file may be
-/// one that is being written.
+/// Removes the bodies of processes that were killed while they wrote them: they hold users' events. A recent file
+/// stays: it may still be in use.
 void BackgroundActivitiesManager::_sweepBodies()
 {
     const std::filesystem::path& directory = _assembly.device.directories.temporary;
@@ -136,7 +136,7 @@ void BackgroundActivitiesManager::_sweepBodies()
         if (!name.starts_with(kUploadBodyPrefix)) continue;
         const auto info = _assembly.fileManager.info(directory / name);
         if (!info || info->kind != platform::FileInfo::Kind::File || info->modified > oldest) continue;
-        if (_assembly.fileManager.remove(directory / name)) log().log("an unfinished upload is removed: {}", name);
+        if (_assembly.fileManager.remove(directory / name)) log().log("removed the unfinished upload body {}", name);
     }
 }
 
@@ -195,7 +195,7 @@ void BackgroundActivitiesManager::taskDidComplete(const std::shared_ptr<platform
         log().fault("response error {}", response ? std::to_string(response->statusCode) : "none");
         _assembly.diagnosticData.addValue(count, "com.quorvane.tavrind.feedbacknotsent");
     }
-    // The session forgets the task once this returns: from then on a kill must not lose what it counted.
+    // The upload session forgets the task when this function returns, so the counts must be on disk before that.
     _assembly.device.counters.synchronize();
     _assembly.feedbackBooks.settle(upload, sent ? FeedbackFate::Sent : FeedbackFate::NotSent, note.events);
 }

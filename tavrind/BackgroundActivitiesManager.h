@@ -18,11 +18,11 @@ namespace tavrin {
 struct Assembly;
 class TavrinFeedbackFlusher;
 
-/// Uploads the closed session files, every ten minutes as a background activity or on demand, and books the outcomes
-/// that the upload session reports.
+/// Uploads the closed session files, every ten minutes as a background activity and on demand. Records the outcomes
+/// that the upload session reports in the books.
 ///
-/// A pass reads each file, deletes it whether it could be read or not, and hands its session to the flusher: a file is
-/// never read twice. Passes run one at a time. Any thread.
+/// A pass reads each file, deletes it even if it could not be read, and passes its session to the flusher. So no file
+/// is read twice. Passes run one at a time. Any thread.
 class BackgroundActivitiesManager : public platform::BackgroundSessionDelegate,
                                     public std::enable_shared_from_this<BackgroundActivitiesManager> {
 public:
@@ -33,13 +33,13 @@ public:
 
     /// Runs one pass, asynchronously, then calls back.
     void insertFlushActivity(std::move_only_function<void()> callback);
-    /// While this is set the background activity does nothing; passes on demand still run.
+    /// While this is set, the background activity does nothing; passes on demand still run.
     [[nodiscard]] bool stopFlushing() const { return _stopFlushing; }
     void setStopFlushing(bool stop) { _stopFlushing = stop; }
 
     [[nodiscard]] const std::shared_ptr<TavrinFeedbackFlusher>& feedbackFlusher() const { return _feedbackFlusher; }
-    /// Books the unfinished uploads of an earlier process, and removes the bodies that it left half made. Call it once
-    /// the upload session exists.
+    /// Books the unfinished uploads of an earlier process and removes its incomplete bodies, asynchronously. Call it
+    /// after the upload session was created.
     void findUploads();
 
     void taskDidSendBodyData(const std::shared_ptr<platform::BackgroundTask>& task, std::uint64_t sent,

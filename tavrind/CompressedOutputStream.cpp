@@ -16,7 +16,7 @@ void endDeflate(z_stream* stream)
 
 z_stream* beginDeflate()
 {
-    constexpr int kRawWindow = -15; // the largest window, and no header
+    constexpr int kRawWindow = -15; // the largest window; negative: no header
     auto stream = std::make_unique<z_stream>();
     if (deflateInit2(stream.get(), Z_DEFAULT_COMPRESSION, Z_DEFLATED, kRawWindow, 8, Z_DEFAULT_STRATEGY) != Z_OK)
         throw std::bad_alloc();
@@ -73,7 +73,7 @@ bool CompressedOutputStream::_deflate(std::string_view bytes, int flush)
 
 std::ptrdiff_t CompressedOutputStream::write(std::string_view bytes)
 {
-    constexpr std::size_t kStep = 1u << 30; // what the compressor's counters hold
+    constexpr std::size_t kStep = 1u << 30; // fits into the compressor's counters
     if (_status != StreamStatus::Open) return -1;
     EVP_DigestUpdate(_sha512Context.get(), bytes.data(), bytes.size());
     for (std::string_view left = bytes; !left.empty(); left.remove_prefix(std::min(kStep, left.size())))

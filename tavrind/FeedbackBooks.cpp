@@ -21,10 +21,11 @@ using platform::Value;
 namespace {
 
 constexpr std::size_t kMaximumFileSize = 64 * 1024;
-/// Uploads that `isSettled` remembers: the upload session forgets an outcome a moment after it is booked.
+/// Number of uploads that `isSettled` remembers. A few suffice: the upload session forgets an outcome right after it is
+/// booked.
 constexpr std::size_t kMaximumSettled = 100;
 
-/// The keys of the fates. From `kFirstDropped` on they are reasons of a drop.
+/// The keys of the fates. From `kFirstDropped` on, they are reasons for a drop.
 constexpr std::array<std::string_view, kFeedbackFates> kNames{
     "open",        "closed",        "uploading",  "sent",          "notSent",    "unknown",      "feedbackOff",
     "noContainer", "refusedAppend", "fileTooBig", "tooOld",        "unreadable", "otherVersion", "damagedTail",
@@ -56,7 +57,7 @@ void FeedbackBooks::_load()
     }
     const auto books = platform::parseJson(contents->view(), kMaximumFileSize);
     if (!books || !books->asDictionary())
-        return TavrinLogForCategory(kLogFeedback).error("feedback books are damaged and begin anew");
+        return TavrinLogForCategory(kLogFeedback).error("feedback books are damaged, starting with empty ones");
 
     for (std::size_t fate = 0; fate < kFeedbackFates; ++fate) {
         const Value& group = fate < kFirstDropped ? *books : (*books)["dropped"];

@@ -17,16 +17,16 @@ class Queue;
 
 namespace tavrin {
 
-/// Where a recorded event is now, or what became of it.
+/// Where a recorded event is, or how it ended.
 enum class FeedbackFate : std::uint8_t {
     Open,      ///< in an open session, or waiting to be sent on its own
     Closed,    ///< in a closed session file
     Uploading, ///< in an upload that has not ended
     Sent,      ///< accepted by the service
     NotSent,   ///< in an upload that failed
-    Unknown,   ///< under way when an earlier process ended, and not found again
-    // The rest are reasons of a drop.
-    FeedbackOff,   ///< the bag switches feedback off
+    Unknown,   ///< pending when an earlier process ended, and not found since
+    // The rest are reasons for a drop.
+    FeedbackOff,   ///< the bag disables feedback
     NoContainer,   ///< the session has no file
     RefusedAppend, ///< it did not fit into the session's file or could not be written
     FileTooBig,    ///< the session's file was too large to be read
@@ -42,43 +42,43 @@ enum class FeedbackFate : std::uint8_t {
 };
 inline constexpr std::size_t kFeedbackFates = static_cast<std::size_t>(FeedbackFate::BufferFull) + 1;
 
-/// The books of the feedback pipeline, counted in events. Every recorded event is in exactly one place: `recorded` is
-/// always the sum over all fates.
+/// The accounts of the feedback pipeline, in events. Every recorded event is in exactly one place: `recorded` is always
+/// the sum over all fates.
 ///
 /// The books outlive the process. They are saved when events move between files (a session is closed, read, uploaded),
-/// not with every event. A new process counts all events under way as unknown, then moves those that it finds in
-/// session files and unfinished uploads to their places. Events that it finds beyond those, written after the last
-/// save, count as recorded. Events are not told apart: one written since the last save takes the place of one that is
-/// gone. Any thread.
+/// not with every event. A new process counts all pending events as unknown, then moves those that it finds in session
+/// files and unfinished uploads to their places. Any further ones were written after the last save; they count as
+/// recorded. Events are only counted, not identified: an event written after the last save can make up for a lost one.
+/// Any thread.
 class FeedbackBooks {
 public:
     /// Reads `path`; a damaged file is logged and replaced. `queue` (serial) runs `saveSoon`.
     FeedbackBooks(platform::FileSystem& files, std::filesystem::path path, std::shared_ptr<platform::Queue> queue);
 
-    /// Books new events, which are at `fate` or dropped because of it.
+    /// Records new events, which are at `fate` or were dropped because of it.
     void record(FeedbackFate fate, std::uint64_t events = 1);
     /// Moves events from one place to another.
     void move(FeedbackFate from, FeedbackFate to, std::uint64_t events);
-    /// Books events of an earlier process that were found again.
+    /// Books found events of an earlier process: moves them from `Unknown` to `fate`, and records those in excess.
     void find(FeedbackFate fate, std::uint64_t events);
     /// Moves the events of an upload from `Uploading` to `outcome`, and saves the books before it returns. `upload`
-    /// names the upload among those of all processes.
+    /// identifies the upload among those of all processes.
     void settle(const std::string& upload, FeedbackFate outcome, std::uint64_t events);
-    /// Returns whether an upload was settled lately. The outcome of one that is reported again, because the process was
-    /// killed before the upload session forgot it, must not be booked again.
+    /// Returns whether an upload was settled recently. If a kill keeps the upload session from forgetting an upload, it
+    /// reports the outcome again; such an outcome must not be booked twice.
     [[nodiscard]] bool isSettled(const std::string& upload) const;
-    /// Writes the books to disk. A failure is logged, and the books go on in memory.
+    /// Writes the books to disk. A failure is logged; the books in memory stay valid.
     void save();
-    /// Saves asynchronously, once for calls that come close together.
+    /// Saves asynchronously. Several calls before the save cause only one.
     void saveSoon();
 
-    /// Identifies this process among all that keep these books.
+    /// Returns an identifier of this process, unique among all that use these books.
     [[nodiscard]] const std::string& process() const { return _process; }
 
     [[nodiscard]] std::int64_t recorded() const;
     [[nodiscard]] std::int64_t count(FeedbackFate fate) const;
-    /// {"recorded", "open", "closed", "uploading", "sent", "notSent", "unknown", "dropped": {reason: events}} with
-    /// every reason.
+    /// Returns {"recorded", "open", "closed", "uploading", "sent", "notSent", "unknown", "dropped": {reason: events}}
+    /// with every reason.
     [[nodiscard]] platform::Value description() const;
 
 private:

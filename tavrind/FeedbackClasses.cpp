@@ -86,7 +86,7 @@ void addSearch(JsonFields& fields, const ZRStartSearchFeedback& record)
 void addLocalSearch(JsonFields& fields, const ZRStartLocalSearchFeedback& record)
 {
     fields("index_type", indexTypeEnumToString(record.indexType));
-    fields("uuid", record.uuid); // nothing else connects the end of a local search with its start
+    fields("uuid", record.uuid); // only this connects the end of a local search with its start
 }
 
 void addSkip(JsonFields& fields, const TAVSkipSearchFeedback& record)
@@ -261,7 +261,7 @@ void addReadyMade(JsonFields& fields, const ZRCustomFeedback& record)
     if (const platform::Dictionary* made = record.jsonFeedback.asDictionary()) fields.object() = *made;
 }
 
-/// The event types are not in the order of the custom types: autofill and crowdsourcing are crossed.
+/// The event types are not in the order of the custom types: autofill and crowdsourcing are swapped.
 EventType customEventType(const ZRCustomFeedback& record)
 {
     constexpr std::array kTypes{CustomUnknown, CustomWendralAutofill, CustomCrowdsourcing, CustomVistrelResultFeatures};

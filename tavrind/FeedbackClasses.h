@@ -12,12 +12,12 @@ class SessionProcessingHelper;
 struct ZRFeedback;
 
 /// What the daemon knows about a class of event records. FeedbackClasses.cpp lists all classes, one row each; nothing
-/// else does. The functions accept records of that class only.
+/// else does. The functions accept only records of their class.
 struct FeedbackClass {
     std::string_view name;
-    /// The event that a record reports.
+    /// Returns the type of the event that a record reports.
     EventType (*eventType)(const ZRFeedback& record);
-    /// The client's own number of the query that a record is about; 0 if it names none.
+    /// Returns the client's number of the query that a record refers to; 0 if it refers to none.
     std::uint64_t (*clientQueryId)(const ZRFeedback& record);
     /// Adds a record's own fields to its event.
     void (*addFields)(JsonFields& fields, const ZRFeedback& record);
@@ -28,7 +28,7 @@ struct FeedbackClass {
     void (*process)(ZRFeedback& record, SessionProcessingHelper& helper);
 };
 
-/// The row of a record's class; that of `ZRFeedback` for a class without a row. Any thread.
+/// Returns the row of a record's class, or the row of `ZRFeedback` for a class without one. Any thread.
 [[nodiscard]] const FeedbackClass& feedbackClassOf(const ZRFeedback& record);
 
 } // namespace tavrin

@@ -12,7 +12,7 @@
 /// The texts of the records' enumerations as values of an upload. Any thread.
 namespace tavrin {
 
-/// The texts of an enumeration, by value. Created on first use; copies share the text.
+/// Returns the texts of an enumeration, by value. They are created on first use; copies share the text.
 template <class E> [[nodiscard]] std::span<const platform::Value> enumStrings()
 {
     static const auto strings = []<std::size_t... I>(std::index_sequence<I...>) {
@@ -21,7 +21,7 @@ template <class E> [[nodiscard]] std::span<const platform::Value> enumStrings()
     return strings;
 }
 
-/// The text of a value; null for a number that no enumerator has, which a client or a damaged file may hold.
+/// Returns the text of a value; null for a number without an enumerator, which a client or a damaged file may contain.
 template <class E> [[nodiscard]] const platform::Value& enumToString(E value)
 {
     static const platform::Value kNone;

@@ -15,8 +15,8 @@ namespace platform {
 struct Error;
 }
 
-/// The JSON form of what events hold; docs/feedback.md shows one event of each type. Values share their text with the
-/// records. Any thread.
+/// The JSON form of the objects in events; docs/feedback.md shows one event of each type. Values share their text with
+/// the records. Any thread.
 namespace tavrin {
 
 enum class ResultEngagementDestination : std::int64_t;
@@ -29,7 +29,7 @@ struct ZRSectionRankingFeedback;
 [[nodiscard]] platform::Dictionary jsonObject(const ZRResultRankingFeedback& ranking);
 [[nodiscard]] platform::Dictionary jsonObject(const ZRSectionRankingFeedback& ranking);
 
-/// The value of a field; null for a missing text, array or record.
+/// Return the JSON value of a field; null for a missing text, array or record.
 [[nodiscard]] inline platform::Value jsonValue(const std::string* text)
 {
     return text ? platform::Value(*text) : platform::Value();
@@ -65,18 +65,18 @@ public:
         _object.set(key, jsonValue(std::forward<T>(value)));
         return *this;
     }
-    /// The object as it is so far, to be replaced or read.
+    /// Returns the object with the fields added so far. The caller may replace it.
     [[nodiscard]] platform::Dictionary& object() { return _object; }
 
 private:
     platform::Dictionary& _object;
 };
 
-/// An error by its code, its domain and its reason.
+/// Returns an error's "code", "domain" and "reason".
 [[nodiscard]] platform::Dictionary encodeErrorForJSON(const platform::Error& error);
 
-/// The URL that the engagement of a result opened; null for none. An engaged action opens its own punchout. A result
-/// opens its punchout only if `destination` says so.
+/// Returns the URL that the engagement of a result opened, or null. An engaged action opens its own punchout. A result
+/// opens its punchout only if `destination` is `Punchout`. Valid while the records are unchanged.
 [[nodiscard]] const std::string* actionDestinationFromResult(const ZRSearchResult& result,
                                                              const ZRActionItem* actionEngaged,
                                                              ResultEngagementDestination destination);

@@ -22,7 +22,7 @@ startNetworkSearchFeedback(std::string input, const platform::UrlRequest& reques
 /// Converts a time-out that a client or the bag asks for, in seconds above 0. The result is a day at most.
 [[nodiscard]] platform::Duration requestTimeout(double seconds);
 
-/// Header fields for a log line.
+/// Returns header fields as JSON text for a log line.
 [[nodiscard]] std::string describe(const platform::HttpHeaders& headers);
 
 } // namespace tavrin

@@ -9,8 +9,8 @@
 
 namespace tavrin {
 
-/// The types of events in an upload. Values and texts are format. No record reports a visible card: its place keeps
-/// later values what they are.
+/// The types of events in an upload. Values and texts are part of the format. No record reports `VisibleCard`; it only
+/// keeps the values of later types.
 enum class EventType : std::int64_t {
     VisibleResults,
     NetworkSearchStart,
@@ -57,19 +57,19 @@ inline constexpr auto kTexts<EventType> =
           "clear_input", "session_end", "skip_tavrin_search", "section_engagement", "visible_section_header",
           "session_missing_results", "session_missing_suggestions", "did_go_to_site", "connection_invalidated");
 
-/// The texts of the event types, by value.
+/// Returns the texts of the event types, by value.
 [[nodiscard]] constexpr std::span<const std::string_view> eventTypes()
 {
     return kTexts<EventType>;
 }
-/// `type` must be an enumerator.
+/// Returns the text of a type, which must be an enumerator.
 [[nodiscard]] std::string_view eventTypeToString(EventType type);
 
-/// The keys that the daemon writes into events and the objects in them. A client's own JSON, headers, features and
-/// timing data have others.
+/// Returns the keys that the daemon writes into events and the objects in them. A client's own JSON, headers, features
+/// and timing data use other keys.
 [[nodiscard]] const std::unordered_set<std::string_view>& sharedKeySet();
 
-/// Whether events of a type are uploaded with their query ids.
+/// Returns whether events of a type are uploaded with their query ids.
 [[nodiscard]] bool requiresQueryId(EventType type);
 
 } // namespace tavrin

@@ -32,7 +32,7 @@ bool isCounts(std::string_view key)
     return key == "_kCFNTimingDataConnectionStartTimeCounts" || key == "_kCFNTimingDataConnectionStopTimeCounts";
 }
 
-/// The entries that are numbers other than 0, by name.
+/// Returns the entries whose values are finite numbers of at least 1 in magnitude, by name without the prefix.
 Dictionary counts(const Dictionary& all)
 {
     Dictionary counts;

@@ -14,7 +14,7 @@ struct TavrinNetEventFeedback {
     std::string name;
 };
 
-/// A moment, in seconds on the loader's clock; finite and not 0.
+/// A point in time, in seconds on the loader's clock; finite and not 0.
 struct TavrinNetEventTimingFeedback : TavrinNetEventFeedback {
     double value = 0;
 };
@@ -24,8 +24,8 @@ struct TavrinNetEventStatsFeedback : TavrinNetEventFeedback {
     platform::Dictionary stats;
 };
 
-/// Returns an array of pairs of a name and a value: first the moments, oldest first, in whole milliseconds since the
-/// oldest, then the statistics. Returns null for anything but a dictionary.
+/// Returns an array of pairs of a name and a value: first the points in time, oldest first, in whole milliseconds since
+/// the oldest, then the statistics. Returns null for anything but a dictionary.
 [[nodiscard]] platform::Value formatNetworkTimingData(const platform::Value& timingData);
 
 /// Returns the peer's address: "192.0.2.7:443", "[2001:db8::1f]:8443". Returns nothing if it is missing, too short or

@@ -12,14 +12,14 @@
 
 namespace tavrin {
 
-/// Replaces the clients' identifiers in one session's events by numbers, and finds what the events refer to but never
-/// show.
+/// Replaces the clients' identifiers in one session's events by numbers, and finds results and suggestions that the
+/// events refer to but never show.
 ///
 /// One helper serves one pass: process each event in time order, then ask what is missing. Identifiers are replaced in
-/// the records themselves; those that stay missing are shared with the events. One thread at a time.
+/// the records themselves; the missing records are shared with the events. One thread at a time.
 class SessionProcessingHelper {
 public:
-    // What an event shows whole.
+    // For a record that an event shows with all its properties.
     void show(ZRSearchResult& result) { _showLeaf(result); }
     void show(ZRSearchSuggestion& suggestion) { _showLeaf(suggestion); }
     void show(ZRResultSection& section) { show(section.results); }
@@ -38,7 +38,7 @@ public:
         if (records) show(*records);
     }
 
-    // What an event only refers to: a result or a suggestion.
+    // For a result or suggestion that an event only refers to.
     template <class T> void refer(const std::shared_ptr<T>& record)
     {
         if (record && _replaceIdentifier(*record)) identifierReferenced(*record->identifier, record);
@@ -49,18 +49,19 @@ public:
         for (const auto& record : *records) refer(record);
     }
 
-    /// The number that replaces an identifier: the same for the same identifier, else the next, from "1". Lives as long
-    /// as the helper.
+    /// Returns the number that replaces an identifier, counted from "1". Equal identifiers get equal numbers. The
+    /// reference is valid as long as the helper.
     [[nodiscard]] const std::string& replacementForIdentifier(const std::string& identifier);
 
-    /// An event refers to a result or suggestion, by its replaced identifier. The first reference is kept until an
-    /// event shows the identifier.
+    /// Notes that an event refers to a record, by its replaced identifier. Keeps the first reference until an event
+    /// shows the identifier.
     void identifierReferenced(const std::string& replacement, std::shared_ptr<ZRSearchResult> result);
     void identifierReferenced(const std::string& replacement, std::shared_ptr<ZRSearchSuggestion> suggestion);
-    /// An event shows what has this replaced identifier.
+    /// Notes that an event shows the record with this replaced identifier.
     void identifierExpanded(const std::string& replacement);
 
-    /// What events refer to and none shows, with replaced identifiers, in the order of their first appearance.
+    /// Return the records that events refer to but none shows, with replaced identifiers, in the order of their first
+    /// appearance.
     [[nodiscard]] std::vector<std::shared_ptr<ZRSearchResult>> missingResults() const;
     [[nodiscard]] std::vector<std::shared_ptr<ZRSearchSuggestion>> missingSuggestions() const;
 

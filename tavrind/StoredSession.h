@@ -24,18 +24,18 @@ public:
     ~StoredSession() override;
 
     /// Writes the session object of docs/feedback.md: its events oldest first, with milliseconds since the first and
-    /// with identifiers replaced, then what they refer to and none shows. The keys end at the first missing value. Each
-    /// event is released once it is written.
+    /// with replaced identifiers, then the results and suggestions that they refer to but never show. The keys end at
+    /// the first missing value. Releases each event after writing it.
     [[nodiscard]] std::optional<std::size_t> getFeedbacksToSend(OutputStream& stream) override;
     [[nodiscard]] std::size_t recordedEvents() const override { return _recordedEvents; }
     [[nodiscard]] std::string description() const override;
 
     [[nodiscard]] const ClientSessionHeader& header() const { return _header; }
-    /// The events in the order of the file, until they are given away.
+    /// Returns the events in the order of the file; empty after `getFeedbacksToSend`.
     [[nodiscard]] const std::vector<std::shared_ptr<TavrinFeedback>>& feedbacks() const { return _feedbacks; }
 
 private:
-    /// The keys after "fb".
+    /// Returns the object without "fb".
     [[nodiscard]] platform::Dictionary _rest() const;
     [[nodiscard]] std::string _userGuid() const;
 

@@ -31,7 +31,7 @@ constexpr platform::Duration kUploadTimeout = 300s;
 constexpr std::size_t kMaximumPath = 1024;
 constexpr int kMaximumNameAttempts = 16;
 
-// Records that are sent on their own wait in memory for the next pass, for ten minutes or longer.
+// Limits of records that are sent on their own: they are in memory until the next pass, for ten minutes or longer.
 constexpr std::size_t kMaximumRecords = 1000;
 constexpr std::size_t kMaximumRecordBytes = 8u << 20; // of JSON text
 
@@ -40,7 +40,7 @@ const platform::Log& log()
     return TavrinLogForCategory(kLogFlusher);
 }
 
-/// A record that is sent on its own, as the JSON that its client made.
+/// A record that is sent on its own: JSON made by its client.
 class CustomFeedbackToSend final : public Flushable {
 public:
     explicit CustomFeedbackToSend(std::shared_ptr<ZRCustomFeedback> record) : _record(std::move(record)) {}
@@ -56,7 +56,7 @@ private:
     std::shared_ptr<ZRCustomFeedback> _record;
 };
 
-/// Creates a file under a name that can't be guessed, and sets `path` to it.
+/// Creates a file with an unpredictable name and stores its path in `path`.
 platform::Result<std::unique_ptr<platform::AppendFile>>
 makeTemporaryFile(platform::FileSystem& files, const std::filesystem::path& directory, std::filesystem::path& path)
 {
@@ -204,7 +204,7 @@ void TavrinFeedbackFlusher::_flushObject(Flushable& object, Bodies* bodies)
     const auto count = object.getFeedbacksToSend(stream);
     stream.close();
     const auto error = stream.streamError();
-    if (!count || error) { // the file is left where it is
+    if (!count || error) { // the background activity removes the file later
         log().error("Invalid JSON Object {} error {}", platform::Private{object.description()},
                     error ? error->description() : "not a dictionary");
         return drop(error ? FeedbackFate::NoBody : FeedbackFate::NotJson);

@@ -28,23 +28,23 @@ struct Assembly;
 struct ZRCustomFeedback;
 class TAVBag;
 
-/// What a flusher sends. The numbers are stored with upload tasks.
+/// The kind of feedback that a flusher sends. The numbers are stored with upload tasks.
 enum class FlusherIdentity : std::int64_t {
     Crowdsourcing, ///< records that clients report for a service of their own
     Feedbacks,     ///< sessions
 };
 template <> inline constexpr auto kTexts<FlusherIdentity> = texts("crowdsourcing", "Feedbacks");
 
-/// The text of an identity; empty for any other number.
+/// Returns the text of an identity; empty for any other number.
 [[nodiscard]] std::string_view convertIdentifierToString(FlusherIdentity identifier);
 
-/// How the names of temporary files begin that hold an upload's body while it is written.
+/// Prefix of the names of temporary files for upload bodies.
 inline constexpr std::string_view kUploadBodyPrefix = "flusher_";
 
-/// What the upload session stores with a task.
+/// The data that the upload session stores with a task.
 struct UploadNote {
     FlusherIdentity flusher{};
-    std::int64_t feedbacks = 0; ///< what the statistics count when the task ends
+    std::int64_t feedbacks = 0; ///< added to the statistics when the task ends
     std::uint64_t events = 0;   ///< recorded events in the body
     std::string process{};      ///< the process that made the task: see `FeedbackBooks::process`
 
@@ -54,13 +54,13 @@ struct UploadNote {
 
 /// Compresses feedback into JSON files and uploads each to the endpoint that the bag names.
 ///
-/// Every object gets one attempt: after a flush it is gone, whether it could be uploaded or not. Without an endpoint
-/// nothing is uploaded. Any thread.
+/// Each object gets one attempt: a flush discards it, even if the upload fails. Without an endpoint, nothing is
+/// uploaded. Any thread.
 class TavrinFeedbackFlusher : public std::enable_shared_from_this<TavrinFeedbackFlusher> {
 public:
     using Bodies = std::vector<platform::Bytes>;
 
-    /// The endpoint follows the bag from now on.
+    /// Creates a flusher whose endpoint follows the bag.
     static std::shared_ptr<TavrinFeedbackFlusher> make(Assembly& assembly, FlusherIdentity identifier);
     TavrinFeedbackFlusher(Assembly& assembly, FlusherIdentity identifier);
     ~TavrinFeedbackFlusher();
@@ -69,13 +69,15 @@ public:
 
     /// Adds an object to the next flush, asynchronously, then calls back.
     void flush(std::shared_ptr<Flushable> object, std::move_only_function<void()> callback);
-    /// Adds a record that is sent on its own. It is dropped if too many wait.
+    /// Adds a record that is sent on its own, asynchronously, then calls back. Drops the record if 1,000 of them or 8
+    /// MiB of their JSON are buffered.
     void flush(std::shared_ptr<ZRCustomFeedback> record, std::move_only_function<void()> callback);
+    /// Adds objects to the next flush. Asynchronous, despite its name.
     void flushSyncFromArray(std::vector<std::shared_ptr<Flushable>> objects);
-    /// Drops what waits for the next flush, asynchronously.
+    /// Drops the objects that are buffered for the next flush, asynchronously.
     void dropFeedbacks();
 
-    /// Flushes asynchronously. The callback, if there is one, gets the compressed bodies.
+    /// Flushes asynchronously, then passes the compressed bodies to the callback, if any.
     void flushToWireAsync(std::move_only_function<void(Bodies)> callback);
     void flushAllToWire(std::move_only_function<void(Bodies)> callback) { flushToWireAsync(std::move(callback)); }
     /// Flushes and returns the compressed bodies. Blocks on the queue.
@@ -86,7 +88,7 @@ public:
     [[nodiscard]] std::vector<std::shared_ptr<Flushable>> sessionBuffer();
     [[nodiscard]] std::optional<platform::Url> serverEndpoint();
 
-    /// The count of each running upload. The count of a task of an earlier process comes from its note.
+    /// The count of feedback in each running upload. For a task of an earlier process, it is read from the task's note.
     void setFeedbacksPerTask(const platform::BackgroundTask& task, std::int64_t count);
     void removeFeedbacksForTask(const platform::BackgroundTask& task);
     [[nodiscard]] std::int64_t getFeedbackCountForTask(const platform::BackgroundTask& task);
@@ -106,7 +108,7 @@ private:
     const FlusherIdentity _identifier;
     std::shared_ptr<platform::Queue> _queueBuffer; // guards the buffer and the endpoint
     std::vector<std::shared_ptr<Flushable>> _sessionBuffer;
-    std::size_t _recordsBuffered = 0; ///< records in the buffer that are sent on their own, and their bytes
+    std::size_t _recordsBuffered = 0; ///< buffered records that are sent on their own, and their bytes
     std::size_t _recordBytesBuffered = 0;
     std::optional<platform::Url> _serverEndpoint;
     std::shared_ptr<platform::Queue> _feedbackCountQueue; // guards the counts

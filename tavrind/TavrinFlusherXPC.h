@@ -17,8 +17,8 @@ struct Assembly;
 struct TavrinFeedback;
 class ClientConnection;
 
-/// Lets diagnostic tools watch and steer the feedback pipeline, on an endpoint of its own. Each role belongs to the
-/// tool that asked for it last. Any thread.
+/// Lets diagnostic tools watch and control the feedback pipeline, on its own endpoint. Each role belongs to the tool
+/// that requested it last. Any thread.
 class TavrinFlusherXPC : public std::enable_shared_from_this<TavrinFlusherXPC> {
 public:
     using ClientConnections = std::vector<std::shared_ptr<ClientConnection>>;
@@ -28,15 +28,15 @@ public:
     TavrinFlusherXPC(Assembly& assembly, GetClientConnections getClientConnections);
     ~TavrinFlusherXPC();
 
-    /// The listener's address.
+    /// Returns the listener's address.
     [[nodiscard]] std::string endpoint() const;
 
     /// Handles a command of `tool`, a `FlusherIntent`; any other number is logged and ignored.
     void initiateConnectionWithIntent(std::uint64_t intent, std::shared_ptr<TAVFlusherListener> tool);
 
-    /// Sends a flushed body to the tool that watches bodies, if there is one.
+    /// Sends a flushed body to the tool that watches bodies, if any.
     void sendDataToSendingStreamListener(const platform::Bytes& body);
-    /// Sends a recorded event to the tool that watches events, if there is one, and logs it at debug level.
+    /// Sends a recorded event to the tool that watches events, if any, and logs it at debug level.
     void sendDataToReceivingStreamListener(const TavrinFeedback& feedback);
 
 private:

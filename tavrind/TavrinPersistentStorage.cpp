@@ -23,8 +23,8 @@ constexpr std::string_view kPrefix = "session.";
 constexpr double kDefaultMaxFileSize = 4u << 20;    // bytes
 constexpr double kDefaultMaxFileAge = 48 * 60 * 60; // seconds
 constexpr double kLargestLimit = 1e15;
-/// Files open and waiting, by `FileUse`; each open one takes a descriptor. One-off sessions have a limit of their own,
-/// so that they never keep a real session from its file.
+/// Limits of open and listed files, by `FileUse`; each open file takes a descriptor. One-off sessions have a separate
+/// limit, so that they never prevent the creation of a real session's file.
 constexpr std::array kMaximumFiles{2000, 100};
 constexpr int kMaximumNameAttempts = 16;
 
@@ -102,8 +102,8 @@ std::optional<std::int32_t> TavrinPersistentStorage::_adopt(const std::string& n
         return std::nullopt;
     }
     if (attributes->kind != platform::FileInfo::Kind::File) {
-        log().error("{} is no regular file and is left alone", fileUrl.string());
-        return sessionNumber(name); // the name is taken nevertheless
+        log().error("{} is not a regular file, ignoring it", fileUrl.string());
+        return sessionNumber(name); // its number is in use
     }
     const auto container = std::make_shared<FileContainer>(_store, fileUrl);
     const bool isTooOld = platform::toSeconds(_assembly.device.clock.wallNow() - attributes->created) > _maxFileAge;
@@ -131,7 +131,7 @@ void TavrinPersistentStorage::_settleSoon()
     _queue->async([self = shared_from_this()] {
         if (self->_unsettled.empty()) return;
         self->_settle();
-        self->_settleSoon(); // in a task of its own, so that waiting events are written in between
+        self->_settleSoon(); // a separate task lets waiting events be written in between
     });
 }
 
@@ -148,10 +148,10 @@ std::optional<fs::path> TavrinPersistentStorage::_newFileUrl()
 std::shared_ptr<FileContainer> TavrinPersistentStorage::createFileContainerForWriting(FileUse use)
 {
     if (_fileCounts[index(use)] >= kMaximumFiles[index(use)]) {
-        log().error("{} session files of this use are waiting, no file created", kMaximumFiles[index(use)]);
+        log().error("{} session files of this use exist, creating none", kMaximumFiles[index(use)]);
         return nullptr;
     }
-    // A name that something else has taken since the scan is skipped.
+    // Skips names that another process has used since the scan.
     for (int attempt = 0; attempt < kMaximumNameAttempts; ++attempt) {
         const auto fileUrl = _newFileUrl();
         if (!fileUrl) break;

@@ -22,8 +22,8 @@ struct FileContainerStore;
 class FileContainer;
 enum class FileUse;
 
-/// Returns the number in the name of a session file ("session.17"); nothing for another name or a number that leaves no
-/// room for later ones.
+/// Returns the number in the name of a session file ("session.17"); nothing for another name, or for a number above
+/// INT32_MAX / 2, which would leave too few numbers for later files.
 [[nodiscard]] std::optional<std::int32_t> sessionNumber(std::string_view fileName);
 
 /// The directory of session files.
@@ -32,8 +32,8 @@ enum class FileUse;
 /// earlier process are listed from the start, except those that are too old. Any thread.
 class TavrinPersistentStorage : public std::enable_shared_from_this<TavrinPersistentStorage> {
 public:
-    /// Scans the directory. The events in the files that it finds are counted afterwards, file by file on the queue,
-    /// and files that are too old are deleted there.
+    /// Scans the directory. Afterwards, on the queue and file by file, counts the events in the found files and deletes
+    /// files that are too old.
     static std::shared_ptr<TavrinPersistentStorage> make(Assembly& assembly);
     explicit TavrinPersistentStorage(Assembly& assembly);
     ~TavrinPersistentStorage();
@@ -46,7 +46,8 @@ public:
     void closeSessionWithFileContainer(std::shared_ptr<FileContainer> container);
     /// Deletes a file and removes it from the list, asynchronously.
     void deleteSessionWithFileContainer(std::shared_ptr<FileContainer> container);
-    /// Blocks until the files deleted so far cannot come back after a power cut. Writes to disk; not on the queue.
+    /// Blocks until the files deleted so far cannot reappear after a power failure. Writes to disk; must not be called
+    /// on the queue.
     void syncDeletions();
 
     [[nodiscard]] const FileContainerStore& store() const { return *_store; }

@@ -38,7 +38,7 @@ struct TavrinSessionEndFeedback : platform::RecordOf<TavrinSessionEndFeedback, Z
 
     /// The texts of the reasons, by value.
     [[nodiscard]] static constexpr std::span<const std::string_view> eventTypes() { return kTexts<SessionEndReason>; }
-    /// The text of a reason; null for a number that is no reason, which a damaged session file may hold.
+    /// Returns the text of a reason; null for a number without one, which a damaged session file may hold.
     [[nodiscard]] static const platform::Value& triggerEventEnumToString(SessionEndReason reason)
     {
         return enumToString(reason);
@@ -47,7 +47,7 @@ struct TavrinSessionEndFeedback : platform::RecordOf<TavrinSessionEndFeedback, Z
     static constexpr auto fields() { return std::tuple{platform::field("reason", &TavrinSessionEndFeedback::reason)}; }
 };
 
-/// Results that events of the session refer to and none shows. `results` does not change after construction.
+/// Results that events of the session refer to but none shows. `results` does not change after construction.
 struct TavrinSessionMissingResults : platform::RecordOf<TavrinSessionMissingResults, ZRFeedback> {
     static constexpr std::string_view kClass = "TavrinSessionMissingResults";
     std::vector<std::shared_ptr<ZRSearchResult>> results;
@@ -63,7 +63,7 @@ struct TavrinSessionMissingResults : platform::RecordOf<TavrinSessionMissingResu
     }
 };
 
-/// Suggestions that events of the session refer to and none shows.
+/// Suggestions that events of the session refer to but none shows.
 struct TavrinSessionMissingSuggestions : platform::RecordOf<TavrinSessionMissingSuggestions, ZRFeedback> {
     static constexpr std::string_view kClass = "TavrinSessionMissingSuggestions";
     std::vector<std::shared_ptr<ZRSearchSuggestion>> suggestions;
@@ -79,7 +79,7 @@ struct TavrinSessionMissingSuggestions : platform::RecordOf<TavrinSessionMissing
     }
 };
 
-/// A client's connection ended; the session that it shares goes on.
+/// A client's connection ended; the shared session continues.
 struct TavrinConnectionInvalidated : platform::RecordOf<TavrinConnectionInvalidated, ZRFeedback> {
     static constexpr std::string_view kClass = "TavrinConnectionInvalidated";
     static constexpr auto fields() { return std::tuple<>{}; }
