@@ -34,9 +34,9 @@ class TavrinUserGUIDController;
 
 /// Holds every long-lived service of the daemon.
 ///
-/// Services are made once, in the order of Startup.cpp, and live as long as the assembly. Each takes the assembly and
-/// reaches its siblings through it when it needs them; during start-up, siblings that come later are null. After
-/// start-up nothing here changes: any thread may read it.
+/// Services are created once, in the order of Startup.cpp, and live as long as the assembly. Each service reaches the
+/// others through the assembly; during start-up, services that are created later are null. The assembly does not change
+/// after start-up: any thread may read it.
 struct Assembly {
     explicit Assembly(platform::Device& device);
     ~Assembly();
@@ -61,7 +61,7 @@ struct Assembly {
     std::shared_ptr<BackgroundActivitiesManager> backgroundFlusher;
     std::shared_ptr<TavrinUserGUIDController> guidController;
     std::shared_ptr<ClientSessionManager> clientSessionManager;
-    std::shared_ptr<platform::Queue> dateQueue; ///< sessions decide on it which is the day's first
+    std::shared_ptr<platform::Queue> dateQueue; ///< serialises the choice of a client's first session of the day
     std::shared_ptr<Lookup> lookup;
     bool sharedSession;         ///< all clients share one session and one GUID
     bool testFeedbacks = false; ///< sessions also keep their feedback in memory

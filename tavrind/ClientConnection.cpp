@@ -33,7 +33,7 @@ namespace tavrin {
 
 namespace {
 
-/// How the search view appears where a search is likely to follow.
+/// The appearances of the search view after which a search is likely.
 constexpr std::array kWarmingEvents{
     SearchViewAppearTrigger::TodayView,          SearchViewAppearTrigger::KeyboardShortcut,
     SearchViewAppearTrigger::MouseClickOnMenu,   SearchViewAppearTrigger::TapToInput,
@@ -132,8 +132,7 @@ void ClientConnection::configure(std::shared_ptr<TAVSessionConfiguration> config
     reply(_clientStateManager->endpoint());
 }
 
-/// Runs on the thread that installs the bag, inside the controller's barrier, so the push is handed to the connection's
-/// queue.
+/// Called inside the bag controller's barrier, so the push is queued on the connection's queue.
 void ClientConnection::bagChangeNotification(std::shared_ptr<const TAVBag> bag)
 {
     TavrinLogForCategory(kLogBag).info("bag change notification: {}", bag ? bag->version() : "none");
@@ -181,8 +180,8 @@ void ClientConnection::request(std::shared_ptr<TAVRequest> request, RequestReply
     _state->perform(*kind, std::move(request), std::move(reply));
 }
 
-/// Only the newest query counts: a query whose id is not above the highest so far gets an empty reply at once, and so
-/// does one that a newer query has overtaken when its answer comes.
+/// Only the newest query counts. A query whose id is not above the highest accepted one gets an empty reply at once. If
+/// a newer query is accepted before an answer arrives, that answer is delivered empty.
 void ClientConnection::search(const RequestKind& kind, std::shared_ptr<TAVRequest> request, RequestReply reply)
 {
     const std::int64_t queryId = request->queryId;

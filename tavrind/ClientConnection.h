@@ -19,10 +19,11 @@ class ClientState;
 class ClientStateManager;
 class TavrinFlusherXPC;
 
-/// What one client connection talks to.
+/// The daemon's side of one client connection.
 ///
-/// The first valid configuration binds it to the state of its client, for good. Calls of the protocol run on the
-/// connection's queue; all else: any thread. Answers to searches come on any thread and only read the highest query id.
+/// The first valid configuration binds it to its client's state; the binding never changes. Protocol calls run on the
+/// connection's queue, other functions on any thread. Answers to searches arrive on any thread and only read the
+/// highest query id.
 class ClientConnection : public TAVDaemonXPC, public std::enable_shared_from_this<ClientConnection> {
 public:
     /// `remoteObject` is the client's side of `connection`.
@@ -42,14 +43,15 @@ public:
 
     /// Ends the client's session, then calls back. A connection that never configured calls back at once.
     void flushSession(std::move_only_function<void()> callback);
-    /// The same after the connection was invalidated; `flushed` says whether there was a session to flush.
+    /// Handles the end of the connection; see `ClientSessionManager::flushSessionInvalidation`. Without a session
+    /// manager, calls back with false at once.
     void flushSessionInvalidation(std::move_only_function<void(bool flushed)> callback);
 
     [[nodiscard]] const std::shared_ptr<platform::ipc::Connection>& connection() const { return _connection; }
     [[nodiscard]] std::int64_t currentQueryId() const { return _currentQueryId; }
-    /// Short name of the client; none before it has configured, and for clients without one.
+    /// Returns the client's short name; nothing before it has configured or if it has none.
     [[nodiscard]] std::optional<std::string> clientShortName() const;
-    /// Empty before the client has configured.
+    /// Returns the client's user agent; empty before it has configured.
     [[nodiscard]] std::string userAgent() const;
 
 private:
@@ -72,10 +74,10 @@ private:
     std::shared_ptr<TAVSessionConfiguration> _configuration;
     std::shared_ptr<ClientState> _state;
     std::atomic<std::int64_t> _currentQueryId = 0; // the highest accepted; only compare-and-swap raises it
-    // Held while a query is accepted, and while an answer is checked and sent: else a newer query could be accepted and
-    // answered between the check of an older one and its delivery.
+    // Held while a query is accepted, and while an answer is checked and sent. Otherwise a newer query could be
+    // accepted and answered between the check of an older answer and its delivery.
     std::mutex _orderMutex;
-    std::atomic<bool> _reportedNoState = false; ///< one error session for a connection
+    std::atomic<bool> _reportedNoState = false; ///< limits the error sessions to one for each connection
     platform::NotificationCenter::Token _bagObserver;
 };
 

@@ -30,29 +30,29 @@ public:
     /// Adds an event. `call` (may be null) is the client's call that reported it: it is released once the event is
     /// written or dropped.
     virtual void addFeedback(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call = {}) = 0;
-    /// The GUID under which the session began.
+    /// Returns the user's GUID at the beginning of the session.
     [[nodiscard]] virtual const platform::Uuid& userGuid() const = 0;
-    /// The events kept in memory, oldest first.
+    /// Returns the events that are kept in memory (see `Assembly::testFeedbacks`), oldest first.
     [[nodiscard]] virtual std::vector<std::shared_ptr<TavrinFeedback>> getSessionFeedbacks() = 0;
-    /// The same events as dictionaries, with milliseconds since the first.
+    /// Returns the same events as dictionaries, with timestamps in milliseconds since the first event.
     [[nodiscard]] virtual platform::Value::Array feedbacksWithRelativeTimestamp() = 0;
     /// Calls back with the session of each user agent; `last` is true for the final one.
     virtual void enumerateSessions(const std::function<void(ClientSession& session, bool last)>& callback) = 0;
 };
 
-/// One session of one user agent. Its events are written to a file of its own as they come, until the session is
-/// complete; `StoredSession` is that file read back. Any thread.
+/// One session of one user agent. Writes its events to its own file as they arrive, until the session is complete;
+/// `StoredSession` is the content of that file. Any thread.
 class ClientSession final : public Session {
 public:
     /// Begins a session with `feedback`, whose agent and GUID become the session's, and creates its file.
     ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback> feedback, std::int64_t previousSessionEndReason,
                   std::shared_ptr<void> call = {});
-    /// A one-off session: its only record is `feedback`, and the caller completes it.
+    /// Begins a one-off session: `feedback` is its only record, and the caller completes it.
     ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback> feedback);
     ~ClientSession() override;
 
     void addFeedback(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call = {}) override;
-    /// Ends the session: its file is closed and waits for its upload.
+    /// Ends the session: closes its file and lists it for upload.
     void sessionComplete();
     [[nodiscard]] const platform::Uuid& userGuid() const override { return _header.userGuid; }
     std::vector<std::shared_ptr<TavrinFeedback>> getSessionFeedbacks() override;

@@ -7,7 +7,7 @@
 
 namespace tavrin {
 
-/// The header of a session file: what an upload has besides the events.
+/// The header of a session file: what an upload contains besides the events.
 struct ClientSessionHeader : platform::RecordOf<ClientSessionHeader> {
     static constexpr std::string_view kClass = "ClientSession";
 
@@ -17,7 +17,7 @@ struct ClientSessionHeader : platform::RecordOf<ClientSessionHeader> {
     std::optional<platform::Date> baseTime; ///< when the session began
     std::int64_t previousSessionEndReason = 0;
     bool firstUse = false;         ///< the client's first session of the day
-    bool removeTimestamps = false; ///< the upload must not tell when the session began
+    bool removeTimestamps = false; ///< the upload must not reveal when the session began
 
     static constexpr auto fields()
     {

@@ -39,7 +39,7 @@ const platform::Log& log()
 
 } // namespace
 
-/// What comes with an event of the state machine.
+/// The arguments of an event of the state machine.
 struct ClientSessionManager::Occasion {
     std::shared_ptr<TavrinFeedback> feedback{};
     std::shared_ptr<void> call{};

@@ -23,10 +23,10 @@ enum class SessionEndReason : std::int64_t;
 enum class SessionState : unsigned {
     Open,
     SoftLimit, ///< open for ten minutes; the next engagement, idleness or five more minutes end it
-    None,      ///< there is no session
+    None,      ///< no session exists
 };
 
-/// What changes a session's state. The numbers are known outside; 4 is unused.
+/// An event that may change a session's state. The numbers are fixed; 4 is unused.
 enum class SessionEvent : unsigned {
     AddFeedback = 0,
     SoftLimit = 1,
@@ -48,8 +48,8 @@ enum class SessionEvent : unsigned {
 ///      │                  │ another GUID                 │ 5 more minutes, and as on the left
 ///      └──────────────────┴──────────────────────────────┘
 ///
-/// A session that ends because of another GUID or idleness is followed at once by the next, which begins with the
-/// feedback at hand. Idleness and engagements also reset the GUID. Every session stores why the previous one ended.
+/// After an end because of another GUID or idleness, the next session begins at once with the current feedback.
+/// Idleness and engagements also reset the GUID. Every session stores why the previous one ended.
 ///
 /// State is confined to one queue; timers and callbacks run there. Any thread.
 class ClientSessionManager : public std::enable_shared_from_this<ClientSessionManager> {
@@ -59,13 +59,13 @@ public:
                          std::string identifier);
     virtual ~ClientSessionManager();
 
-    /// Adds an event to the session, asynchronously, and stamps it with the current GUID. Drops it if the bag switches
-    /// feedback off. `call` (may be null) is released once the event is written or dropped.
+    /// Adds an event to the session, asynchronously, and stamps it with the current GUID. Drops it if the bag disables
+    /// feedback. `call` (may be null) is released once the event is written or dropped.
     virtual void addTavrinFeedback(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call = {});
-    /// The current session, or null. Blocks on the queue.
+    /// Returns the current session, or null. Blocks on the queue.
     [[nodiscard]] std::shared_ptr<Session> session();
-    /// Applies an event that comes without feedback, asynchronously. Events of memory pressure have no source yet;
-    /// unknown numbers are logged and ignored. An external flush calls back when it is done.
+    /// Applies an event without feedback, asynchronously. Nothing sends the events of memory pressure yet. Unknown
+    /// numbers are logged and ignored. `callback` is called after an external flush, and not for any other event.
     void externalEvent(SessionEvent event, std::move_only_function<void()> callback = {});
     /// Ends the session, asynchronously, then calls back.
     void flushSession(std::move_only_function<void()> callback)
@@ -89,7 +89,7 @@ public:
     /// Wraps an error of the daemon as feedback of the current user.
     [[nodiscard]] static std::shared_ptr<TavrinFeedback> errorFeedback(const platform::Error& error,
                                                                        Assembly& assembly);
-    /// Adds that record to the assembly's session manager, if there is one yet.
+    /// Adds that record to the assembly's session manager, if it exists yet.
     static void reportErrorAsTavrindFeedback(const platform::Error& error, Assembly& assembly);
 
 private:
@@ -122,7 +122,7 @@ private:
     std::shared_ptr<platform::Queue> _sessionQueue; // guards all below
     std::shared_ptr<Session> _session;
     SessionState _currentState = SessionState::None;
-    std::uint64_t _sessionCounter = 0; ///< sessions begun; timers of an earlier session are ignored by it
+    std::uint64_t _sessionCounter = 0; ///< sessions begun; identifies the session of a timer
     SessionEndReason _flushReason{};   ///< of the last session
     platform::Date _expirationTime;    ///< when the session counts as idle
 };

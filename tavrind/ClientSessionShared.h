@@ -19,13 +19,13 @@ public:
     /// Adds the event to the session of its user agent, asynchronously.
     void addFeedback(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call = {}) override;
     [[nodiscard]] const platform::Uuid& userGuid() const override { return _userGuid; }
-    // Session after session, in the order of the user agents.
+    // The results are those of all sessions, ordered by user agent.
     std::vector<std::shared_ptr<TavrinFeedback>> getSessionFeedbacks() override;
     platform::Value::Array feedbacksWithRelativeTimestamp() override;
     void enumerateSessions(const std::function<void(ClientSession& session, bool last)>& callback) override;
 
 private:
-    /// Joins what `collect` returns for each session.
+    /// Concatenates the results of `collect` for all sessions.
     template <class List> List _joined(List (ClientSession::*collect)());
     void _begin(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call);
 

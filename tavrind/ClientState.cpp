@@ -106,11 +106,12 @@ void ClientState::bag(const std::optional<std::string>& userAgent, BagReply repl
     });
 }
 
-/// Calls `then` with whether there is a bag: at once, or after the current queue was held back for it.
+/// Calls `then` with whether the client has a bag: at once, or if one must be fetched first, after suspending the
+/// current queue for at most `kBagWait`.
 void ClientState::_ensureBag(std::move_only_function<void(bool)> then)
 {
     enum class State { NoAgent, Held, Missing };
-    // The fetch is taken before the bag is asked for: it may end at any moment from then on.
+    // The event is read before the bag is requested, because the fetch may end at any moment after that.
     const auto [state, fetch] = _queue->sync([this] {
         if (!_view.userAgent) return std::pair(State::NoAgent, _bagFetch);
         if (_view.bag) return std::pair(State::Held, _bagFetch);
@@ -145,8 +146,8 @@ void ClientState::_storeBagFrom(const TAVBag& bag)
     });
 }
 
-/// A null bag stands for a failed fetch: whoever waits now goes on without a bag; whoever comes later waits for the
-/// next fetch.
+/// A null bag means that a fetch failed: waiting requests continue without a bag, and later ones wait for the next
+/// fetch.
 void ClientState::bagChangeNotification(const std::shared_ptr<const TAVBag>& bag)
 {
     _queue->async([self = shared_from_this(), bag] {

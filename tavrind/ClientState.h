@@ -19,22 +19,22 @@ class ClientSessionManager;
 class QueryCache;
 class TavrinUserGUIDController;
 
-/// A client as its requests see it, at one moment.
+/// A snapshot of a client's state for its requests.
 struct ClientView {
     std::shared_ptr<const TAVBag> bag;                            ///< null before the first one
-    std::optional<std::string> userAgent;                         ///< none before a client has introduced itself
+    std::optional<std::string> userAgent;                         ///< nothing before the client has introduced itself
     std::shared_ptr<const TAVSessionConfiguration> configuration; ///< null before a client has configured
 };
 
-/// What the daemon keeps for one client: its view of the bag, its query cache, its session and GUID. `Exchange`
-/// performs its requests. All connections of one client share one state, for the life of the process.
+/// The daemon's state for one client: its view of the bag, its query cache, its session and GUID. `Exchange` performs
+/// its requests. All connections of one client share one state, for the life of the process.
 ///
-/// Bag: none until a user agent is known; then waited for, 1 s at most, by whoever needs it; then held, and replaced
-/// with every new one. A new user agent rebuilds the held bag and empties the cache.
+/// Bag: without a user agent there is none. Requests wait for the first bag, 1 s at most. From then on, each new bag
+/// replaces the held one. A new user agent rebuilds the held bag and empties the cache.
 ///
-/// Requests must come from a task of a serial queue (the connection's), which is held back while a request waits for
-/// the first bag, so that a connection's requests keep their order. Every request is answered once. Everything else:
-/// any thread.
+/// Requests must be made in a task of a serial queue (the connection's). The queue is suspended while a request waits
+/// for the first bag, so that a connection's requests keep their order. Every request is answered exactly once. All
+/// other functions: any thread.
 class ClientState : public std::enable_shared_from_this<ClientState> {
 public:
     ClientState(std::string identifier, Assembly& assembly);
@@ -42,13 +42,13 @@ public:
 
     /// Stores the client's user agent, unless it is empty, and replies with the client's view of the bag.
     void bag(const std::optional<std::string>& userAgent, BagReply reply);
-    /// Opens the connection to the service ahead of a search.
+    /// Opens the connection to the service before a search, unless a request was sent in the last 30 s.
     void warm();
 
-    /// Performs a request of that kind; `Exchange` says how.
+    /// Performs a request, whose kind must be `kind`. See `Exchange`.
     void perform(const RequestKind& kind, std::shared_ptr<TAVRequest> request, RequestReply reply);
 
-    // The same by the kinds' names.
+    // The same for each kind.
     void search(std::shared_ptr<TAVSearchRequest> request, RequestReply reply)
     {
         _perform(std::move(request), std::move(reply));
@@ -80,14 +80,14 @@ public:
 
     [[nodiscard]] const std::string& identifier() const { return _identifier; }
     [[nodiscard]] const std::optional<std::string>& clientShortName() const { return _clientShortName; }
-    /// Null if the user default "TAVNoQueryCache" switches it off.
+    /// Returns null if the user default "TAVNoQueryCache" disables the cache.
     [[nodiscard]] const std::shared_ptr<QueryCache>& queryCache() const { return _queryCache; }
     [[nodiscard]] ClientView view() const;
     [[nodiscard]] std::optional<std::string> userAgent() const { return view().userAgent; }
     [[nodiscard]] std::shared_ptr<const TAVBag> bag() const { return view().bag; }
     void setUserAgent(std::string userAgent);
     void setConfiguration(std::shared_ptr<const TAVSessionConfiguration> configuration);
-    /// Where the client's feedback goes; null only while the daemon starts.
+    /// Returns the session manager that receives the client's feedback; null only during start-up.
     [[nodiscard]] std::shared_ptr<ClientSessionManager> sessionManager() const;
     [[nodiscard]] std::shared_ptr<TavrinUserGUIDController> guidController() const;
 
@@ -111,7 +111,7 @@ private:
     ClientView _view;
     std::optional<platform::Date> _lastNetworkRequest;
     platform::NotificationCenter::Token _bagObserver;
-    std::shared_ptr<platform::Event> _bagFetch; // signalled as a bag arrives or its fetch fails
+    std::shared_ptr<platform::Event> _bagFetch; // signalled when a bag arrives or its fetch fails
 };
 
 } // namespace tavrin

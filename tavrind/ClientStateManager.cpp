@@ -21,7 +21,7 @@ using platform::Value;
 
 namespace {
 constexpr const char* kSessionsKey = "sessions";
-/// Client identifiers known at once. States live as long as the daemon, and each takes about 6 KB.
+/// Maximum number of clients. A state lives as long as the daemon and takes about 6 KB.
 constexpr std::size_t kMaximumStates = 1024;
 } // namespace
 
@@ -59,7 +59,7 @@ std::shared_ptr<ClientState> ClientStateManager::stateForClientIdentifier(const 
         return stateCache[*identifier] = std::make_shared<ClientState>(*identifier, _assembly);
     });
     if (!state) {
-        log.fault("{} clients are known; another is refused", kMaximumStates);
+        log.fault("{} clients are known, refusing another", kMaximumStates);
         return nullptr;
     }
     log.info("using client state: {}", *identifier);
@@ -115,7 +115,7 @@ void ClientStateManager::_accept(std::shared_ptr<platform::ipc::Connection> conn
     const platform::Log& log = TavrinLogForCategory(kLogConnection);
     log.debug("new endpoint connection");
     connection->exportObject(endpointHandler(weak_from_this()));
-    // The handler owns the connection until its end.
+    // The handler owns the connection until it ends.
     connection->setInvalidationHandler([connection, &log] { log.debug("endpoint connection invalidated"); });
     connection->resume();
 }

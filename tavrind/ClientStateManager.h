@@ -23,25 +23,27 @@ class ImageLoader;
 
 /// The registry of client states, and the object served on the endpoint that clients get when they configure.
 ///
-/// One identifier always has the same state, made when it is first asked for and kept for the life of the process. With
-/// the user default "TAVPersistSessions" the registry is written after a client's first bag and restored at start.
+/// An identifier always has the same state, which is created on first use and kept for the life of the process. With
+/// the user default "TAVPersistSessions", the registry is saved after a client's first bag and restored at start-up.
 ///
-/// `loadImages` must be called from a task of a serial queue; see `ImageLoader`. Everything else: any thread.
+/// `loadImages` must be called from a task of a serial queue; see `ImageLoader`. All other functions: any thread.
 class ClientStateManager : public TAVEndpointXPC, public std::enable_shared_from_this<ClientStateManager> {
 public:
     static std::shared_ptr<ClientStateManager> make(Assembly& assembly);
     explicit ClientStateManager(Assembly& assembly);
     ~ClientStateManager() override;
 
-    /// Creates the state on first use. Null for a missing or empty identifier.
+    /// Returns the client's state, and creates it on first use. Returns null if the identifier is missing or empty, or
+    /// if 1,024 other clients are known.
     [[nodiscard]] std::shared_ptr<ClientState> stateForClientIdentifier(const std::optional<std::string>& identifier);
-    /// The address of the endpoint's listener.
+    /// Returns the address of the endpoint's listener.
     [[nodiscard]] std::string endpoint() const;
-    /// {"identifier", "agent"} of each state that has a user agent, sorted by identifier.
+    /// Returns {"identifier", "agent"} of each state that has a user agent, sorted by identifier.
     [[nodiscard]] platform::Value::Array sessions() const;
+    /// Saves the registry asynchronously if "TAVPersistSessions" is set.
     void saveState();
 
-    // Images: passed on to the image loader.
+    // Forwarded to the image loader.
     void processImagesFromResponse(const platform::Value& response, const std::shared_ptr<const TAVBag>& bag,
                                    platform::UrlSource source);
     [[nodiscard]] std::set<std::string> validImageHosts() const;

@@ -9,7 +9,7 @@ struct DaemonOptions {
     platform::LogLevel logLevel = platform::LogLevel::Default;
 };
 
-/// Reads the command line; prints help, the version or what is wrong with it, and exits, where that is asked for.
+/// Parses the command line. For --help, --version and invalid options, prints a text and ends the process.
 [[nodiscard]] DaemonOptions parseDaemonOptions(int argc, char** argv);
 
 } // namespace tavrin

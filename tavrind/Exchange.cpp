@@ -117,7 +117,7 @@ void Exchange::_perform(bool hasBag)
     _send();
 }
 
-/// Replies without record and error where the rules of the bag want no request; false where they want one.
+/// If the bag's rules forbid the request, replies without record and error and returns true.
 bool Exchange::_isSkipped()
 {
     const platform::Log& log = TavrinLogForCategory(_kind.logCategory);
@@ -136,8 +136,8 @@ bool Exchange::_isSkipped()
     return false;
 }
 
-/// Replies with a set cached for a completion of what was typed, if there is one. A query with items of its own always
-/// goes to the service.
+/// If the cache has a set for a completion of the typed text, replies with it and returns true. A query with additional
+/// query items is always sent to the service.
 bool Exchange::_answerFromCache()
 {
     const auto& cache = _client->queryCache();
@@ -158,7 +158,7 @@ bool Exchange::_answerFromCache()
     return true;
 }
 
-/// Records the start and sends the request; one that can't be built ends in an error.
+/// Records the start and sends the request. If the request can't be built, replies with an error instead.
 void Exchange::_send()
 {
     const platform::Log& log = TavrinLogForCategory(_kind.logCategory);
@@ -168,12 +168,13 @@ void Exchange::_send()
     else
         log.log("Dispatching network request for {}", _kind.name);
 
-    // Read first: what empties the cache from here on makes the answer one of the past.
+    // Read first: if the cache is emptied after this point, the answer belongs to an earlier state and is not cached.
     if (const auto& cache = _client->queryCache()) _cacheGeneration = cache->generation();
     const auto guids = _client->guidController();
     const double timeout = _view.configuration ? _view.configuration->timeoutIntervalForRequest : 0;
     const std::string userAgent = _view.userAgent.value_or("");
-    // Reading the GUID may roll it, which empties query caches: only a request that is about to be built does so.
+    // Reading the GUID may replace it, which empties query caches. So it is only read for a request that is about to be
+    // built.
     const platform::Uuid userGuid = guids ? guids->currentUserGUID() : platform::Uuid();
     const ClientRequest parts{
         .request = *_request,
@@ -240,8 +241,8 @@ void Exchange::_completed(std::optional<Bytes> data, std::optional<UrlResponse> 
 
     auto decoded = JsonDocument::parse(data->view());
     const auto document = decoded ? std::make_shared<const JsonDocument>(std::move(*decoded)) : nullptr;
-    // Stored before the reply, so that a client that has seen an answer finds it in the cache. The reply needs the text
-    // alone: the sets are made on the cache's queue, not here.
+    // The store is queued before the reply, so that a client that has received an answer finds it in the cache. The
+    // reply needs only the text, so the sets are created on the cache's queue.
     const bool cached = document && _mayCache(*document);
     const platform::UrlSource source = platform::sourceOf(*response);
     if (cached)
@@ -267,14 +268,14 @@ void Exchange::_completed(std::optional<Bytes> data, std::optional<UrlResponse> 
     _forceFetch(*response);
 }
 
-/// True if some result set names the query that it completes: no other is cached.
+/// Returns true if the answer may be cached: it must have a result set with a "query".
 bool Exchange::_mayCache(const JsonDocument& answer) const
 {
     return _kind.isSearch && _client->queryCache() && !_request->queryString.empty() && answer.anyElementHas("query");
 }
 
-/// Has the answer's images fetched ahead, and returns the result sets to be cached. On the cache's queue, or on a
-/// global one if nothing is to be cached.
+/// Starts the prefetch of the answer's images, and returns the result sets to cache. Runs on the cache's queue, or on a
+/// global queue if nothing is to be cached.
 std::vector<std::shared_ptr<const CachedResultSet>> Exchange::_useAnswer(const JsonDocument& document,
                                                                          platform::UrlSource source, bool cached)
 {

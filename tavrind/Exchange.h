@@ -29,16 +29,17 @@ struct ZRStartNetworkSearchFeedback;
 ///                                         ▼
 ///                                       reply ──► feedback
 ///
-/// Every kind of request takes these steps; what differs is in its `RequestKind`. The reply is called exactly once.
-/// Whoever performs the next step holds the exchange: the queue that waits for the bag, then the loader's task. Steps
-/// that write members never overlap with others, so members need no lock.
+/// All kinds of request take these steps; their differences are in `RequestKind`. The reply is called exactly once. The
+/// performer of the next step owns the exchange: first the queue that waits for the bag, then the loader's task. Steps
+/// that write members never run concurrently with other steps, so members need no lock.
 class Exchange : public std::enable_shared_from_this<Exchange> {
 public:
     Exchange(Assembly& assembly, std::shared_ptr<ClientState> client, const RequestKind& kind,
              std::shared_ptr<TAVRequest> request, RequestReply reply);
     ~Exchange();
 
-    /// Call once, from a task of a serial queue: the queue is held back while the request waits for the first bag.
+    /// Starts the exchange. Call it once, in a task of a serial queue; the queue is suspended while the request waits
+    /// for the first bag.
     void begin();
 
 private:
@@ -68,7 +69,7 @@ private:
     const std::shared_ptr<TAVRequest> _request;
     RequestReply _reply;
 
-    ClientView _view;                   // the client as it was after the wait for the bag
+    ClientView _view;                   // the client after the wait for the bag
     std::uint64_t _cacheGeneration = 0; // of the query cache, before the request was built
     platform::UrlRequest _httpRequest;  // as sent
     std::shared_ptr<ZRStartNetworkSearchFeedback> _start;

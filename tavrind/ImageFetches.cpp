@@ -54,7 +54,7 @@ void ImageFetches::end(const platform::Url& url)
     _entries.erase(found);
 }
 
-/// Puts the entry at the end of a lane.
+/// Appends the entry to a lane.
 void ImageFetches::_wait(Entry& entry, LaneIndex index)
 {
     Lane& lane = _lanes[index];
@@ -65,7 +65,7 @@ void ImageFetches::_wait(Entry& entry, LaneIndex index)
     _update(lane, entry.fetch.url.host());
 }
 
-/// Takes the entry out of those that wait in its lane.
+/// Removes the entry from the waiting ones of its lane.
 void ImageFetches::_leaveTurn(Entry& entry)
 {
     Lane& lane = _lanes[entry.lane];
@@ -75,7 +75,7 @@ void ImageFetches::_leaveTurn(Entry& entry)
     _update(lane, entry.fetch.url.host());
 }
 
-/// Settles when the host's next fetch may begin, after its fetches have changed; forgets a host without fetches.
+/// Updates the turn of the host's next fetch after its fetches have changed. Removes a host without fetches.
 void ImageFetches::_update(Lane& lane, const std::string& name)
 {
     Host& host = lane.hosts.at(name);

@@ -16,13 +16,13 @@
 
 namespace tavrin {
 
-/// Keeps someone waiting for fetches: every holder of a copy is one of them, and the wait ends with the last copy.
+/// A wait for fetches. Every fetch that belongs to it holds a copy; it ends when the last copy is destroyed.
 using ImageGroup = std::shared_ptr<void>;
 
 /// One image to be fetched, or under way.
 struct ImageFetch {
     platform::Url url;
-    std::optional<platform::Duration> timeoutInterval; ///< none: the session's
+    std::optional<platform::Duration> timeoutInterval; ///< default: the session's
     platform::UrlSource source;                        ///< of the answer that named the image
 };
 
@@ -30,10 +30,10 @@ struct ImageFetch {
 ///
 ///     add ──► waiting ──► next ──► under way ──► end
 ///
-/// Each URL is here once, in one of two lanes: images that a client waits for, and images that are fetched ahead. Each
-/// lane has slots of its own, so that fetches ahead that hang keep no client waiting, and in each lane a host takes a
-/// third of the slots at most, so that a host that hangs keeps no other host's images from being fetched. Apart from
-/// that, fetches begin in the order in which they were added, those that a client waits for first.
+/// Each URL is listed once, in one of two lanes: images that a client waits for, and prefetched images. Each lane has
+/// its own slots, so hanging prefetches delay no client. Within a lane, a host uses at most a third of the slots, so a
+/// hanging host does not block the others. Otherwise fetches begin in the order of their addition; those that a client
+/// waits for begin first.
 ///
 /// Not synchronised: one thread at a time.
 class ImageFetches {
@@ -42,17 +42,18 @@ public:
     static constexpr std::size_t kUnderWay = 24;
     /// Slots of a lane that one host may take.
     static constexpr std::size_t kUnderWayOfHost = 8;
-    /// Fetches that may wait in a lane: answers may name, and clients ask for, any number of images.
+    /// Limit of waiting fetches in a lane: an answer or a client may name any number of images.
     static constexpr std::size_t kWaiting = 10'000;
 
-    /// Adds `group` to the fetch of that URL and returns true; returns false if there is none. A waiting fetch that
-    /// gets its first group changes to the lane of those that clients wait for. A null group only asks.
+    /// Returns whether the URL is listed. If it is, and `group` isn't null, adds `group` to its fetch. A waiting
+    /// prefetch then moves to the lane of images that a client waits for, unless that is full.
     bool join(const platform::Url& url, const ImageGroup& group);
-    /// Adds the fetch of a URL that isn't here, for a client if `group` isn't null. Returns false if too many wait.
+    /// Adds the fetch of a URL that is not listed: for a client if `group` isn't null, else as a prefetch. Returns
+    /// false if its lane is full.
     bool add(ImageFetch fetch, const ImageGroup& group);
-    /// The fetch to begin now, which is under way from here on; none if there is no free slot for any that waits.
+    /// Returns the next fetch and counts it as under way. Returns nothing if no waiting fetch has a free slot.
     [[nodiscard]] std::optional<ImageFetch> next();
-    /// Removes a fetch that was under way, and releases its groups. Does nothing for any other URL.
+    /// Removes a fetch that is under way, and releases its groups. Ignores any other URL.
     void end(const platform::Url& url);
 
     [[nodiscard]] std::size_t underWay() const { return _lanes[kAwaited].underWay + _lanes[kAhead].underWay; }
@@ -66,7 +67,7 @@ private:
         ImageFetch fetch;
         std::vector<ImageGroup> groups;
         LaneIndex lane;
-        std::optional<Turn> turn; // none: under way
+        std::optional<Turn> turn; // nothing: under way
     };
     struct Host {
         std::map<Turn, Entry*> waiting;

@@ -36,11 +36,12 @@ namespace {
 
 using namespace std::chrono_literals;
 
-/// Limit of a client's wait, whatever it asks for.
+/// Maximum time of a client's wait.
 constexpr platform::Duration kLongestLoad = 60s;
-/// Bytes: the largest response that the HTTP cache stores.
+/// In bytes; the largest response that the HTTP cache stores.
 constexpr std::size_t kMaximumImage = 10u << 20;
-/// Bytes in one answer: less than may wait to be read by all clients together (`ipc::Limits::unreadBytes`).
+/// Bytes of images in one reply; less than the limit of unread bytes for all clients together
+/// (`ipc::Limits::unreadBytes`).
 constexpr std::size_t kMaximumAnswer = 16u << 20;
 constexpr std::size_t kMaximumHosts = 1000;
 
@@ -49,7 +50,7 @@ const platform::Log& log()
     return TavrinLogForCategory(kLogImages);
 }
 
-/// All URLs in the order of fetching.
+/// Returns all URLs in the order of fetching.
 std::vector<Url> inOrder(OrderedImages images)
 {
     std::vector<Url> urls = std::move(images.primary);
@@ -146,7 +147,7 @@ Value ImageLoader::_cachedImages(const Value::Array& images, const TAVBag& bag) 
     std::size_t size = 0;
     const auto map = [&](const std::string& name, platform::Bytes image) {
         if (size + image.size() > kMaximumAnswer)
-            return log().error("no room for {} bytes of image {}", image.size(), Private{name});
+            return log().error("the reply is full, leaving out {} bytes of image {}", image.size(), Private{name});
         size += image.size();
         loaded.set(name, std::move(image));
     };
@@ -180,11 +181,12 @@ void ImageLoader::_fetchImageURL(const Url& url, std::optional<platform::Duratio
 {
     _imageQueue->assertOnQueue();
     if (!url.scheme().starts_with("http")) return log().fault("invalid url scheme: {}", Private{url.string()});
-    if (_imageFetches.join(url, group)) return _startImageFetches(); // it may have changed lanes
+    if (_imageFetches.join(url, group))
+        return _startImageFetches(); // the fetch may have moved to a lane with a free slot
     const auto cache = _assembly.urlSession->cache();
     if (cache && cache->find(url)) return log().log("found {} in cache", Private{url.string()});
     if (!_imageFetches.add({url, timeoutInterval, source}, group))
-        return log().error("{} images wait already, not fetching {}", ImageFetches::kWaiting, Private{url.string()});
+        return log().error("{} images are waiting, not fetching {}", ImageFetches::kWaiting, Private{url.string()});
     _startImageFetches();
 }
 

@@ -22,29 +22,28 @@ struct Assembly;
 struct ZRFeedback;
 class TAVBag;
 
-/// Fetches images into the HTTP cache: ahead, those that an answer of the service names, and on demand, those that a
+/// Fetches images into the HTTP cache: prefetches those that answers of the service name, and fetches those that a
 /// client waits for.
 ///
-/// An image is fetched from its own URL and from the URL that the bag makes of its identifier, 10 MiB at most, within
-/// five minutes. What the cache holds isn't fetched, and what is under way isn't fetched twice; `ImageFetches` decides
-/// which fetch is next.
+/// An image is fetched from its own URL and from the URL that the bag maps its identifier to. Its limits are 10 MiB and
+/// five minutes. Cached images and images under way are not fetched again. `ImageFetches` decides which fetch is next.
 ///
-/// `loadImages` must be called from a task of a serial queue (the connection's), which is held back while it waits.
-/// Everything else: any thread.
+/// `loadImages` must be called in a task of a serial queue (the connection's), which is suspended while it waits. All
+/// other functions: any thread.
 class ImageLoader : public std::enable_shared_from_this<ImageLoader> {
 public:
     explicit ImageLoader(Assembly& assembly);
 
-    /// Starts to fetch the images of an answer, and returns. Without a bag it does nothing. `source` says where the
-    /// answer came from: its image URLs lead no further than a redirect from there.
+    /// Starts the prefetch of an answer's images, asynchronously. Does nothing without a bag. `source` is the answer's
+    /// origin: its image URLs may lead only where a redirect from there may.
     void processImagesFromResponse(const platform::Value& response, const std::shared_ptr<const TAVBag>& bag,
                                    platform::UrlSource source);
-    /// Fetches images ({"url", "id"}) and replies with the bytes of those that the cache has after `timeout`
-    /// nanoseconds (a minute at most), by "url" or else "id". One reply holds 32 MiB of images; further ones are left
-    /// out. Clients name images of answers, so that the source of the last answer holds for them; before the first
-    /// one, that of the bag's search URL.
+    /// Fetches images ({"url", "id"}), for `timeout` nanoseconds or a minute at most, and replies with the bytes of
+    /// those that the cache then has, by "url" or else "id". A reply holds 16 MiB of images; further ones are left out.
+    /// Clients name images of answers, so their URLs may lead only where a redirect from the last answer's origin may.
+    /// Before the first answer, that is the origin of the bag's search URL.
     void loadImages(platform::Value::Array images, std::uint64_t timeout, platform::Reply<platform::Value> reply);
-    /// Hosts of the images that were asked for or named in answers, the first 1000. For diagnostics.
+    /// Returns the first 1,000 hosts of images that clients requested or answers named. For diagnostics.
     [[nodiscard]] std::set<std::string> validImageHosts() const;
 
 private:

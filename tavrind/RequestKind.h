@@ -20,9 +20,9 @@ class TAVNetworkRequestFactory;
 [[nodiscard]] std::shared_ptr<ZRStartNetworkSearchFeedback>
 startRecordOf(const TAVRequest& request, const platform::UrlRequest& httpRequest, EndpointType endpoint);
 
-/// What one kind of client request has of its own. `Exchange` performs every kind with the same steps.
+/// The properties of one kind of client request. `Exchange` performs every kind with the same steps.
 ///
-/// `builder` and `startRecord` take requests of the class `className` only.
+/// `builder` and `startRecord` accept only requests of the class `className`.
 struct RequestKind {
     std::string_view className;
     TavrinLogCategory logCategory = kLogRequest;
@@ -31,11 +31,11 @@ struct RequestKind {
     EndpointType endpoint = EndpointType::TavrinSearch;
     TAVTraceCode traceStart = kTraceNone;
     TAVTraceCode traceAnswer = kTraceNone;
-    bool isSearch = false;          ///< ordered by query id, counted, has a minimum length, answered from the cache
-    bool needsBag = true;           ///< waits for the first bag, and is not performed if the bag is disabled
-    bool skipsWhenDisabled = false; ///< a disabled bag leaves a skip record
-    bool retryable = false;         ///< handed to the loader with retries left
-    bool expires = false;           ///< retried until its time-out has passed since it was sent; else never
+    bool isSearch = false; ///< ordered by query id, counted, has a minimum length, may be answered from the cache
+    bool needsBag = true;  ///< waits for the first bag, and is not performed if the bag is disabled
+    bool skipsWhenDisabled = false; ///< records a skip if the bag is disabled
+    bool retryable = false;         ///< has retries, which take place only if it `expires`
+    bool expires = false;           ///< retries end when its time-out has passed since the first attempt
     bool servedOnEndpoint = false;  ///< also served on the endpoint that `configure` returns
     std::optional<platform::UrlRequest> (TAVNetworkRequestFactory::*builder)(const ClientRequest&) = nullptr;
     std::shared_ptr<ZRStartNetworkSearchFeedback> (*startRecord)(const TAVRequest& request,
@@ -43,7 +43,7 @@ struct RequestKind {
                                                                  EndpointType endpoint) = startRecordOf;
 };
 
-/// The kind of a request; null for a record of any other class, which is not served. Any thread.
+/// Returns the kind of a request; null for a record of any other class, which is not served. Any thread.
 [[nodiscard]] const RequestKind* kindOf(const TAVRequest& request);
 
 } // namespace tavrin

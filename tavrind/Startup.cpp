@@ -31,7 +31,8 @@ namespace {
 
 using namespace std::chrono_literals;
 
-/// The certification authorities that replace the system's, from the variable that OpenSSL reads.
+/// Returns the file of the certification authorities that replace the system's; empty if there is none. OpenSSL reads
+/// the same variable.
 std::string caFile()
 {
     const char* path = std::getenv("SSL_CERT_FILE");
@@ -105,7 +106,7 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device)
 
     auto listener = device.ipc.listen(daemonInterface(), "com.quorvane.tavrind.connection");
     if (!listener) {
-        // Running tasks refer to the services, so these stay until the process exits.
+        // Running tasks refer to the services, so these are never destroyed.
         (void)daemon.release();
         return std::unexpected(std::move(listener.error()));
     }

@@ -17,7 +17,7 @@ namespace tavrin {
 class TavrinDPAppDeepLinkIngester;
 class TavrinService;
 
-/// A started daemon: the services, and what only the entry point holds.
+/// A started daemon: the services, and the objects that only the entry point owns.
 struct Daemon {
     explicit Daemon(platform::Device& device);
     ~Daemon();
@@ -28,8 +28,8 @@ struct Daemon {
     std::unique_ptr<platform::ipc::Listener> listener;
 };
 
-/// Makes the services in their fixed order, and then listens. Fails only if the service's socket can't be had, for
-/// example because another daemon serves it. The device must outlive the daemon.
+/// Creates the services in their fixed order, then starts to listen. Fails only if the service's socket is not
+/// available, for example because another daemon serves it. The device must outlive the daemon.
 [[nodiscard]] platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device);
 
 } // namespace tavrin

@@ -10,7 +10,7 @@ class CounterStore;
 
 namespace tavrin {
 
-/// The daemon's statistics counters: a thin front to the device's aggregate statistics. Any thread.
+/// Forwards the daemon's statistics counters to the device's aggregate statistics. Any thread.
 class TavrinDiagnosticDataReporter {
 public:
     explicit TavrinDiagnosticDataReporter(platform::CounterStore& counters) : _counters(counters) {}
@@ -22,7 +22,7 @@ private:
     platform::CounterStore& _counters;
 };
 
-/// "com.quorvane.tavrind.PREFIX.SUFFIX"
+/// Returns "com.quorvane.tavrind.PREFIX.SUFFIX".
 [[nodiscard]] std::string createCounterKey(std::string_view prefix, std::string_view suffix);
 
 } // namespace tavrin

@@ -28,8 +28,8 @@ enum TavrinLogCategory : unsigned {
     TavrinLoggingCategoryCount
 };
 
-/// Returns the handle of a category; the first call makes all of them. An index out of range is a programming error and
-/// aborts. Any thread.
+/// Returns the handle of a category; the first call creates all of them. An index out of range is a programming error
+/// and aborts the process. Any thread.
 [[nodiscard]] const platform::Log& TavrinLogForCategory(unsigned category);
 
 } // namespace tavrin

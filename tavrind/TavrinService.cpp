@@ -66,7 +66,7 @@ std::optional<std::string> TavrinService::clientIDForConnection(platform::Proces
 
 void TavrinService::listenerShouldAcceptNewConnection(std::shared_ptr<ipc::Connection> connection)
 {
-    // Off the listener's thread: identifying the peer reads its own file system, which may be slow or stuck.
+    // Not on the listener's thread: identifying the peer reads the peer's file system, which may be slow or hang.
     connection->queue()->async([self = shared_from_this(), connection] { self->_accept(connection); });
 }
 
@@ -95,7 +95,7 @@ void TavrinService::_accept(const std::shared_ptr<ipc::Connection>& connection)
     connection->resume();
 }
 
-/// On the connection's queue.
+/// Runs on the connection's queue.
 void TavrinService::_connectionInvalidated(const std::shared_ptr<ClientConnection>& connection,
                                            const std::string& clientId, pid_t pid)
 {

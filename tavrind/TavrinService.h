@@ -26,13 +26,14 @@ public:
     explicit TavrinService(Assembly& assembly);
     ~TavrinService() override;
 
-    /// Accepts the connection on its own queue; none is refused. Run loop's thread.
+    /// Accepts the connection, on the connection's queue; refuses none. Run loop's thread.
     void listenerShouldAcceptNewConnection(std::shared_ptr<platform::ipc::Connection> connection);
 
-    /// A snapshot of the connections, in the order in which they were accepted.
+    /// Returns a snapshot of the connections, in the order of their acceptance.
     [[nodiscard]] std::vector<std::shared_ptr<ClientConnection>> getClientConnections() const;
 
-    /// The peer's application id, else the last component of its executable's path; none if the process is gone.
+    /// Returns the peer's application id, else the last component of its executable's path; nothing if the process has
+    /// ended.
     [[nodiscard]] static std::optional<std::string> clientIDForConnection(platform::ProcessIdentity& processes,
                                                                           pid_t pid);
 

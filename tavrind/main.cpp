@@ -1,4 +1,5 @@
-// The daemon's entry point: the device, the services in their order, the signals, and then the run loop for ever.
+// The daemon's entry point. Creates the device and starts the services, installs the signal handlers, then runs the run
+// loop until the process is killed.
 
 #include <csignal>
 #include <cstdio>
@@ -29,10 +30,10 @@ int main(int argc, char** argv)
     auto daemon = tavrin::startUp(device.device());
     if (!daemon) {
         std::fprintf(stderr, "tavrind: %s\n", daemon.error().reason().c_str());
-        _exit(EXIT_FAILURE); // a request may be under way: nothing is taken apart under it
+        _exit(EXIT_FAILURE); // skips destructors: running tasks may use the services
     }
 
-    // Nothing is flushed on the way out: what must survive a kill is on disk already.
+    // Nothing is flushed at exit: data that must survive a kill is already on disk.
     for (const auto& [signal, name] : {std::pair(SIGINT, "SIGINT"), std::pair(SIGTERM, "SIGTERM")}) {
         runLoop.onSignal(signal, [name] {
             platform::defaultLog().debug("{}", name);
