@@ -23,7 +23,7 @@ std::optional<Date> expireTimeOf(const Value& resultSet, Date now)
     return now + platform::durationFromSeconds(std::clamp(maxAge, -kLongest, kLongest));
 }
 
-/// The text of a reply with this set alone, without spare capacity: it is kept.
+/// Returns the text of a reply with this set alone. It is stored, so it has no spare capacity.
 platform::Bytes answerWith(const Value& resultSet)
 {
     std::string text = platform::toJson(Value::Array{resultSet});
@@ -73,7 +73,7 @@ std::size_t CachedResultSet::resultSetSize() const
 CachedUse useOf(const CachedResultSet& set, std::size_t typedLength, double scale, Date now)
 {
     if (set.expireTime && *set.expireTime <= now) return CachedUse::Expired;
-    // The header carries the scale to a tenth: scales that round to the same tenth are the same to the service.
+    // The header has one decimal: scales that round to the same value are equal for the service.
     constexpr double kSameScale = 0.05 + 1e-6;
     if (scale > 0 && std::abs(scale - set.uiScale) > kSameScale) return CachedUse::OtherScale;
     return typedLength >= set.inputLength ? CachedUse::Candidate : CachedUse::OtherInput;

@@ -34,7 +34,7 @@ struct CachedResultSet : std::enable_shared_from_this<CachedResultSet> {
     const float completionScore;   ///< "completion_score"; 0 if missing
     const float uiScale;           ///< header "X-Quorvane-UI-Scale" of the request; 0 if missing
     [[nodiscard]] std::optional<platform::Uuid> userGuid() const; ///< header "X-Quorvane-UserGuid" of the request
-    [[nodiscard]] platform::Value resultSet() const;              ///< parsed anew from `answer` by each call
+    [[nodiscard]] platform::Value resultSet() const;              ///< each call parses `answer`
     [[nodiscard]] std::size_t resultSetSize() const;              ///< in bytes of JSON
 };
 
@@ -43,13 +43,14 @@ enum class CachedUse {
     Expired,    ///< remove it
     OtherScale, ///< skip it: its images are for another screen
     OtherInput, ///< skip it: it was fetched for a longer input
-    Candidate,  ///< it may answer
+    Candidate,  ///< the set fits
 };
-/// `typedLength` is in UTF-16 units; `scale` is that of the client's screen, compared to a tenth, and 0 takes any set.
+/// `typedLength` is in UTF-16 units. `scale` is the client's screen scale, which is compared to one decimal; 0 accepts
+/// any set.
 [[nodiscard]] CachedUse useOf(const CachedResultSet& set, std::size_t typedLength, double scale, platform::Date now);
 
-/// The candidate with the shortest query; among equally short ones the highest positive score decides, then the order.
-/// Null if there are no candidates.
+/// Returns the candidate with the shortest query. Among equally short ones, prefers the highest positive score, then
+/// the first. Returns null if there are no candidates.
 [[nodiscard]] const CachedResultSet* pickCompletion(std::span<const CachedResultSet* const> candidates);
 
 } // namespace tavrin

@@ -10,8 +10,8 @@ namespace tavrin {
 /// Maps texts to objects, in the order of the texts' bytes, and finds all texts that begin with a prefix. A text that
 /// holds a NUL can't be a key: it is neither stored nor found.
 ///
-/// The tree owns no object and releases none: its user keeps every object alive until it can't be found any more. Not
-/// thread-safe.
+/// The tree does not own the objects. Its user must keep each object alive until its key is removed or gets another
+/// object. Not thread-safe.
 template <class Object> class CritbitTree {
 public:
     CritbitTree()

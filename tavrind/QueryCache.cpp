@@ -145,7 +145,7 @@ void QueryCache::_startListeningForMemoryPressure()
         auto self = weak.lock();
         if (!self) return;
         self->_queue->async([self] {
-            if (!self->_source) return; // cleared meanwhile
+            if (!self->_source) return; // already cleared
             log().log("emptying cache under memory pressure");
             self->_clearCache();
             self->_source.reset();

@@ -55,7 +55,7 @@ constexpr unsigned kClient = kSearch | kZeroKeyword | kMoreResults | kLookup | k
 
 } // namespace
 
-/// What one request is made of, beside the context.
+/// The parts of one request besides the context.
 struct TAVNetworkRequestFactory::Recipe {
     unsigned kind;
     TavrinURLRequestBuilder builder;
@@ -83,7 +83,7 @@ struct TAVNetworkRequestFactory::Recipe {
 
     static void addLookupItems(Recipe& r, const RequestContext&);
 
-    /// A shared item or header: the kinds that carry it, and how it is added. Empty values are left out.
+    /// A shared item or header: the kinds that have it, and the function that adds it. Empty values are omitted.
     struct Rule {
         unsigned kinds;
         void (*apply)(Recipe&, const RequestContext&);
@@ -175,7 +175,7 @@ std::shared_ptr<TAVNetworkRequestFactory> TAVNetworkRequestFactory::make(Assembl
     const std::weak_ptr<TAVNetworkRequestFactory> weak = factory;
     platform::Device& device = assembly.device;
 
-    // Off the start-up path: the first recipe waits for this task on the queue.
+    // Not on the start-up path: the first recipe waits for this task.
     factory->_contextAccessQueue->barrierAsync([weak] {
         auto self = weak.lock();
         if (!self) return;
@@ -245,7 +245,7 @@ TAVNetworkRequestFactory::~TAVNetworkRequestFactory() = default;
 
 UrlRequest TAVNetworkRequestFactory::build(Recipe& recipe)
 {
-    // Read before the context queue is entered: the controller has a queue of its own.
+    // Read before the context queue is entered, because the controller blocks on its own queue.
     if ((recipe.kind & kClient & ~kZeroKeyword) && _assembly.appWhitelistController)
         recipe.signature = _assembly.appWhitelistController->whitelistSignature();
 
@@ -297,7 +297,7 @@ TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::_clientRequest(unsig
                   .client = &client,
                   .userAgent = client.userAgent,
                   .timeout = client.timeout};
-    // The URL of more results says where its search was made, if the search did.
+    // If the search sent its location, the URL of its further results contains it.
     const bool placed = kind == kMoreResults && recipe.builder.containsQueryItemWithName("latlng");
     if (kind != kCard && !placed) _startLocationUpdate();
     recipe.builder.forceQueryItemsFromArray(forced);

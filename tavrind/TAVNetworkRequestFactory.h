@@ -26,19 +26,19 @@ struct TAVRequest;
 class TAVBag;
 class TavrinBagController;
 
-/// Posted by the request factory when the device has moved to another area; see `platform::isSignificantMove`.
+/// Posted by the request factory after the device has moved to another area; see `platform::isSignificantMove`.
 inline constexpr const char* TAVSignificantLocationChange = "TAVSignificantLocationChange";
 /// Posted from a task of the factory's queue once requests reflect the change; no object, no user info.
 inline constexpr const char* TAVLocaleChangeNotification = "TAVLocaleChangeNotification";
 inline constexpr const char* TAVTimeZoneChangeNotification = "TAVTimeZoneChangeNotification";
 inline constexpr const char* TAVCountryCodeChangeNotification = "TAVCountryCodeChangeNotification";
-/// Any field of the device's profile changed. Posted like those above.
+/// Posted in the same way after any field of the device's profile has changed.
 inline constexpr const char* TAVEffectiveSettingsChangeNotification = "TAVEffectiveSettingsChangeNotification";
 
-/// Bit of a field mask: leave out the device's location and its installed applications.
+/// Bit of a field mask: omits the device's location and its installed applications.
 inline constexpr std::uint64_t kFieldMaskNoLocation = 1;
 
-/// The device as requests describe it. An empty text is left out of requests.
+/// The state of the device that requests report. Requests omit empty texts.
 struct RequestContext {
     std::string localeIdentifier;
     std::string effectiveSystemLanguage;
@@ -62,22 +62,23 @@ struct RequestContext {
     std::vector<platform::QueryItem> debuggingQueryItems;
 };
 
-/// A client's request, and what of the client goes into it. Refers to its parts; lives as long as the call.
+/// A client's request, with the client's properties that it contains. It only refers to its parts: valid during the
+/// call.
 struct ClientRequest {
     const TAVRequest& request;
     const TAVBag* bag = nullptr; ///< may be null for more results only
     platform::Uuid userGuid;
     std::string userAgent;
-    std::uint64_t fieldMask = 0;               ///< of search, zero keyword and more results; others ignore it
-    std::optional<platform::Duration> timeout; ///< the client's; none leaves it to the bag
+    std::uint64_t fieldMask = 0;               ///< for search, zero keyword and more results; others ignore it
+    std::optional<platform::Duration> timeout; ///< the client's; default: the bag's
 };
 
 /// Builds every HTTP request that the daemon sends to the service.
 ///
-/// Each kind of request is a recipe: a URL, the items that it forces, the request's own items, and then the shared
-/// items and headers of the table in the .cpp, as defaults. A recipe runs in one synchronous block on the context
-/// queue, so a request sees one consistent snapshot of the context. The factory keeps that context current from the
-/// device's locale, time zone, profile, location and subscriptions, and announces changes that affect the bag.
+/// Each kind of request is a recipe: a URL, forced items, the request's own items, and then the shared items and
+/// headers of the table in the .cpp as defaults. A recipe runs in one synchronous block on the context queue, so a
+/// request sees one consistent snapshot of the context. The factory updates the context from the device's locale, time
+/// zone, profile, location and subscriptions, and announces changes that affect the bag.
 ///
 /// Any thread.
 class TAVNetworkRequestFactory : public std::enable_shared_from_this<TAVNetworkRequestFactory>,
@@ -85,30 +86,32 @@ class TAVNetworkRequestFactory : public std::enable_shared_from_this<TAVNetworkR
 public:
     using Request = std::optional<platform::UrlRequest>;
 
-    /// Computes the context and starts to follow its changes.
+    /// Creates the factory, starts to observe the device, and computes the context asynchronously; the first request
+    /// waits for it.
     static std::shared_ptr<TAVNetworkRequestFactory> make(Assembly& assembly);
     explicit TAVNetworkRequestFactory(Assembly& assembly);
     ~TAVNetworkRequestFactory() override;
 
     [[nodiscard]] platform::UrlRequest bagFetchRequest(const TavrinBagController& controller,
                                                        const std::string& userAgent, const std::string& version);
-    /// Never sent: the bag is stale if this URL differs from that of the time of its fetch.
+    /// This request is never sent. Its URL identifies the bag's context: if it has changed since the fetch, the bag is
+    /// stale.
     [[nodiscard]] platform::UrlRequest bagCacheRequest(const TavrinBagController& controller,
                                                        const std::string& userAgent, const std::string& version);
 
-    /// Changes with everything of the context that the URL of a bag request is made of.
+    /// Returns a number that changes with every part of the context that the URL of a bag request contains.
     [[nodiscard]] std::uint64_t bagContextGeneration() const { return _bagContextGeneration; }
 
-    // A client's requests. Each returns none if the URL is missing in the bag or the request.
+    // A client's requests. Each returns nothing if the bag or the request lacks the URL.
     [[nodiscard]] Request searchRequest(const ClientRequest& client);
     [[nodiscard]] Request zeroKeywordRequest(const ClientRequest& client);
-    /// Takes a `TAVMoreResultsRequest`.
+    /// `client.request` must be a `TAVMoreResultsRequest`.
     [[nodiscard]] Request moreResultsRequest(const ClientRequest& client);
-    /// Takes a `TAVLookupRequest`.
+    /// `client.request` must be a `TAVLookupRequest`.
     [[nodiscard]] Request lookupRequest(const ClientRequest& client);
-    /// Takes a `TAVCardRequest`.
+    /// `client.request` must be a `TAVCardRequest`.
     [[nodiscard]] Request cardRequest(const ClientRequest& client);
-    /// A flight search or flight lookup.
+    /// For a flight search or flight lookup.
     [[nodiscard]] Request flightRequest(const ClientRequest& client);
 
     [[nodiscard]] platform::UrlRequest fileDownloadRequest(const platform::Url& url, const std::string& version,
@@ -118,15 +121,15 @@ public:
                                                             const std::string& digest);
     [[nodiscard]] platform::UrlRequest warmRequest(const platform::Url& url);
 
-    /// Keeps the current location for file downloads. To be called after each network search.
+    /// Stores the current location for later file downloads. Call it after each network search.
     void setPerformedSearch();
-    /// The session entity of the device's geo service; none if it has no session.
+    /// Returns the session entity of the device's geo service; nothing if it has no session.
     [[nodiscard]] std::optional<std::string> getMapsUserSessionEntity();
 
     void didUpdateStorefrontIdentifier(const std::optional<std::string>& storefront) override;
     void didUpdateSubscriptionDictionaries(const std::vector<platform::Value>& subscriptions) override;
 
-    /// A copy of the context. For diagnostics and tests.
+    /// Returns a copy of the context. For diagnostics and tests.
     [[nodiscard]] RequestContext context();
 
 private:

@@ -16,7 +16,7 @@ namespace tavrin {
 /// A request with its retry policy for transport errors.
 struct TAVRetryableNetworkRequest {
     platform::UrlRequest httpRequest; ///< sent on every attempt, unchanged
-    /// A failure after this moment is final. None counts as a moment long past: the request is never repeated.
+    /// A failure after this moment is final. Without a moment, every failure is final.
     std::optional<platform::Date> expire;
     bool delayOnFail = false; ///< wait 1.5 s before each repetition; the delay does not grow
 };

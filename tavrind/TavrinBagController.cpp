@@ -37,10 +37,10 @@ namespace {
 
 constexpr double kTrustedForSeconds = 14400;
 constexpr double kStaleAheadSeconds = 600;
-/// How far the clock may go back, as when it is set by a little, before a fresh bag counts as one of another time.
+/// Seconds by which the clock may be set back before a fresh bag counts as expired.
 constexpr double kClockTolerance = 1;
 constexpr std::size_t kMaximumBagSize = 8u << 20;
-/// How long a fetch may take in all: while one is under way none other begins.
+/// Time limit of a fetch with its retries. Without it, a hanging fetch would prevent all others.
 constexpr platform::Duration kFetchLimit = std::chrono::minutes(2);
 constexpr platform::Duration kFirstAnnouncementInterval = std::chrono::minutes(1);
 constexpr platform::Duration kLongestAnnouncementInterval = std::chrono::hours(4);
@@ -60,7 +60,8 @@ const platform::Log& log()
 BagStaleness bagStaleness(std::optional<double> expiration, const std::string* cachedUrl, platform::Date now,
                           const std::function<std::string()>& currentUrl)
 {
-    // With more time left than a fetch gives, the clock was wrong then or is now. A NaN compares false: stale, too.
+    // If more time is left than a fetch grants, the clock was wrong then or is wrong now. NaN compares false: also
+    // expired.
     const double left = expiration.value_or(0) - platform::secondsSince1970(now);
     if (!(left >= kStaleAheadSeconds && left <= kTrustedForSeconds + kClockTolerance)) return BagStaleness::Expired;
     if (!cachedUrl) return BagStaleness::NoUrl;
@@ -129,7 +130,7 @@ std::shared_ptr<TavrinBagController> TavrinBagController::make(Assembly& assembl
     controller->_refreshObserver = assembly.notificationCenter.observe(
         TAVBagRefreshRequired,
         [weak = controller->weak_from_this(), &device = assembly.device](const platform::Notification&) {
-            // Posted on the main queue, whose thread never waits.
+            // The notification is posted on the main queue, whose thread must not block.
             device.globalQueue(platform::Priority::Default)->async([weak] {
                 if (auto self = weak.lock()) self->_handleRefreshNotification();
             });
@@ -200,7 +201,7 @@ void TavrinBagController::forceFetchBag(const Value& announcement)
 
 std::string TavrinBagController::_bagCacheURL()
 {
-    // The generation is read first: if the context changes meanwhile, the next call makes the URL once more.
+    // The generation is read first: if the context changes after that, the next call builds the URL again.
     const std::uint64_t context = _assembly.requestFactory->bagContextGeneration();
     auto configured = _assembly.userDefaults.string(kBagUrlDefault);
     auto known = _cacheUrl.load();
@@ -300,7 +301,7 @@ Value TavrinBagController::cacheBagDictionary(const Value& fetched)
 void TavrinBagController::cacheBagState(std::shared_ptr<const TAVBag> bag, bool fromDisk)
 {
     if (!bag) return;
-    for (const std::string& problem : bag->problems()) log().error("bag: {}; the default is used", problem);
+    for (const std::string& problem : bag->problems()) log().error("bag: {}; using the default", problem);
     enum : unsigned long { kDisabled, kEnabled, kUnknown };
     const auto newsState = [](const TAVBag* some) -> unsigned long {
         return !some ? kUnknown : TAVBag(some->rawBag(), kNewsUserAgent).isEnabled() ? kEnabled : kDisabled;

@@ -23,10 +23,10 @@ class TAVBag;
 struct ZRStartNetworkSearchFeedback;
 
 /// Posted, without an object, when a bag is installed ("bag": shared_ptr<const TAVBag>) and when a fetch failed
-/// ("bagError": platform::Error). It is posted inside the controller's barrier: observers hand their work on and don't
-/// read the controller.
+/// ("bagError": platform::Error). It is posted inside the controller's barrier: observers must do their work on another
+/// queue, and must not read the controller.
 inline constexpr const char* TAVBagChangeNotification = "TAVBagChangeNotification";
-/// Posted by the request factory when something changed that the bag depends on.
+/// Posted by the request factory after a change of something that the bag depends on.
 inline constexpr const char* TAVBagRefreshRequired = "TAVBagRefreshRequired";
 
 /// System-wide names that tell other processes whether the news client may use the service.
@@ -36,21 +36,22 @@ inline constexpr const char* kNewsDisabledNotifyName = "com.quorvane.tavrin.news
 /// Why a cached bag must be fetched again.
 enum class BagStaleness { Fresh, Expired, NoUrl, UrlChanged };
 
-/// Decides by time, then by URL. `expiration` is the moment from which the bag is no longer trusted, in seconds since
-/// 1970; none counts as 1970. The bag has expired from 600 s before that moment on, and while that moment is more than
-/// four hours ahead, which no fetch makes it. `cachedUrl` is the bag cache request's URL at the time of the fetch;
-/// `currentUrl` makes the one of now, and is called only if the time doesn't decide.
+/// Decides by time, then by URL. `expiration` is the time until which the bag is trusted, in seconds since 1970;
+/// default 0. The bag expires 600 s before it. A bag with more than four hours left has expired as well: no fetch
+/// grants so much, so the clock was wrong. `cachedUrl` is the bag cache request's URL at the time of the fetch.
+/// `currentUrl` returns the current one; it is called only if the time doesn't decide.
 [[nodiscard]] BagStaleness bagStaleness(std::optional<double> expiration, const std::string* cachedUrl,
                                         platform::Date now, const std::function<std::string()>& currentUrl);
 
-/// Orders version texts with runs of digits compared as numbers: "9" before "10".
+/// Returns whether version `a` precedes `b`. Runs of digits compare as numbers: "9" precedes "10".
 [[nodiscard]] bool versionPrecedes(std::string_view a, std::string_view b);
 
-/// When to fetch for a version that the service announces and that doesn't come with the next bag: the first time at
-/// once, then again at intervals that double from one minute to four hours. A higher version is new. Not thread-safe.
+/// Limits the fetches for a version that the service announces but does not deliver: the first one is immediate, the
+/// next ones follow at intervals that double from one minute to four hours. A higher version starts again. Not
+/// thread-safe.
 class AnnouncedVersion {
 public:
-    /// Whether to fetch for `version` at `now`, in host ticks. If so, that counts as done.
+    /// Returns whether to fetch for `version` at `now`, in host ticks. If so, counts the fetch as done.
     [[nodiscard]] bool take(std::string_view version, std::uint64_t now);
 
 private:
@@ -59,12 +60,12 @@ private:
     std::uint64_t _due = 0;
 };
 
-/// Fetches the bag, keeps one copy in memory and one on disk, and tells the daemon when there is a new one.
+/// Fetches the bag, keeps one copy in memory and one on disk, and notifies the daemon of a new one.
 ///
-/// Life: the copy on disk, stale or not, is used from the start. A bag is stale from 3 h 50 min after its fetch on, and
-/// when the URL that it was fetched from would be another now; whoever reads a stale bag gets it, and starts a fetch.
-/// One fetch runs at a time, for two minutes at most; further ones are dropped. A failed fetch leaves the bag as it
-/// was. No timer repeats it: the next reading of the stale bag does.
+/// Life: the daemon starts with the copy on disk, stale or not. A bag becomes stale 3 h 50 min after its fetch, or when
+/// the URL of its fetch changes. Reading a stale bag returns it and starts a fetch. One fetch runs at a time, for two
+/// minutes at most; further ones are dropped. A failed fetch does not change the bag. The next read of the stale bag
+/// repeats it; there is no timer.
 ///
 /// Any thread. The assembly must outlive it.
 class TavrinBagController : public std::enable_shared_from_this<TavrinBagController> {
@@ -74,19 +75,19 @@ public:
     explicit TavrinBagController(Assembly& assembly);
     ~TavrinBagController();
 
-    /// Where a device in `country` fetches its bag.
+    /// Returns the URL from which a device in `country` fetches its bag.
     [[nodiscard]] platform::Url bagFetchURLWithCountry(const std::string& country) const;
 
-    /// The bag; none starts a fetch.
+    /// Returns the bag, or null. Starts a fetch if there is no bag or a stale one.
     [[nodiscard]] std::shared_ptr<const TAVBag> currentBag();
-    /// The bag, stale or not; a stale one starts a fetch soon.
+    /// Returns the bag, or null. Starts a fetch asynchronously if the bag is stale.
     [[nodiscard]] std::shared_ptr<const TAVBag> cachedBagState();
-    /// The bag as it is; starts nothing.
+    /// Returns the bag, or null. Starts no fetch.
     [[nodiscard]] std::shared_ptr<const TAVBag> inMemoryBag() const;
     [[nodiscard]] std::optional<platform::Url> warmURL();
 
-    /// Fetches the version that the service announces, a number under "bag", if the bag in memory precedes it and
-    /// `AnnouncedVersion` agrees. Does nothing without a bag or a number.
+    /// Fetches the version that the service announces, a number under "bag", if the bag in memory is older and
+    /// `AnnouncedVersion` permits it. Does nothing without a bag or a number.
     void forceFetchBag(const platform::Value& announcement);
 
     [[nodiscard]] bool fetchInProgress() const { return _fetchInProgress; }
@@ -94,7 +95,7 @@ public:
 private:
     using Completion = std::move_only_function<void(std::shared_ptr<const TAVBag>, std::optional<platform::Error>)>;
     struct Fetch;
-    /// The URL of the bag cache request, and what it was made of: each read of the bag compares it.
+    /// The URL of the bag cache request, with its inputs. Cached, because each read of the bag compares it.
     struct CacheUrl {
         std::uint64_t context;
         std::optional<std::string> configured;

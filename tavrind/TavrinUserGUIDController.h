@@ -19,16 +19,16 @@ inline constexpr const char* TAVUserGUIDChangeNotification = "TAVUserGUIDChangeN
 /// Owns the GUID that identifies a user for a short time: it is replaced by a random one after 15 minutes or on
 /// request.
 ///
-/// Rotation is lazy: no timer fires after 15 minutes, but the next reading rolls the GUID. It is never stored, so every
-/// start begins with a new one. Every roll is counted and posted as TAVUserGUIDChangeNotification, later and on the
-/// controller's queue. Any thread.
+/// Replacement is lazy: no timer fires, but the first read after 15 minutes replaces the GUID. It is never stored, so
+/// every start begins with a new one. Every replacement is counted and posted as TAVUserGUIDChangeNotification,
+/// asynchronously on the controller's queue. Any thread.
 class TavrinUserGUIDController : public std::enable_shared_from_this<TavrinUserGUIDController> {
 public:
     explicit TavrinUserGUIDController(Assembly& assembly);
 
-    /// Returns the GUID, and rolls it first if it has expired.
+    /// Returns the GUID, and replaces it first if it has expired.
     [[nodiscard]] platform::Uuid currentUserGUID();
-    /// Rolls the GUID before the next reading.
+    /// Replaces the GUID before the next read.
     void reset();
 
 private:

@@ -22,9 +22,9 @@ struct Internal {
     std::uint32_t byte;     // index of the first byte in which the keys of the two subtrees differ
     std::uint8_t otherBits; // all bits except the highest differing one
 
-    /// The child for a key whose byte at `byte` is `c`.
+    /// Returns the child for a key whose byte at `byte` is `c`.
     [[nodiscard]] int direction(unsigned char c) const { return (1 + (otherBits | c)) >> 8; }
-    /// A key that ends before `byte` has a NUL there.
+    /// Returns the child for a key. A key that ends before `byte` has a NUL there.
     [[nodiscard]] int direction(std::string_view key) const
     {
         return direction(byte < key.size() ? static_cast<unsigned char>(key[byte]) : 0);
@@ -55,7 +55,7 @@ External& external(Link link)
     return *reinterpret_cast<External*>(link);
 }
 
-/// The only leaf that can hold `key`.
+/// Returns the only leaf that can hold `key`.
 External& bestLeaf(Link link, std::string_view key)
 {
     while (isInternal(link)) {
@@ -134,7 +134,7 @@ int critbit_insert(critbit_tree& tree, std::string_view key, void* value, int re
     node->otherBits = static_cast<std::uint8_t>(255 - std::bit_floor(static_cast<unsigned>(ourByte ^ theirByte)));
     const int direction = node->direction(theirByte);
 
-    // Above it stand the nodes that part keys at an earlier bit.
+    // The nodes above it separate keys at an earlier bit.
     Link* link = &tree.root;
     while (isInternal(*link)) {
         Internal& above = internal(*link);
@@ -199,7 +199,7 @@ void critbit_clear(critbit_tree& tree)
 int critbit_allprefixed(const critbit_tree& tree, std::string_view prefix, critbit_callback callback, void* context)
 {
     if (!tree.root) return 1;
-    Link top = tree.root; // of all that begins with the prefix
+    Link top = tree.root; // the subtree of all keys with the prefix
     Link link = tree.root;
     while (isInternal(link)) {
         const Internal& node = internal(link);

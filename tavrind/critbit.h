@@ -14,14 +14,14 @@ namespace tavrin {
 /// proportion to what it visits, except that the walk's stack grows with the depth of the tree (at most 8 levels for
 /// each byte of a key).
 ///
-/// A zeroed tree is empty. The owner clears the tree before it goes. Not thread-safe.
+/// A zeroed tree is empty. The owner must clear the tree before destroying it. Not thread-safe.
 struct critbit_tree {
     /// 0, or the address of a node, with the lowest bit set for an internal node.
     std::uintptr_t root = 0;
     std::uint64_t count = 0; ///< keys
     /// Called for every value that leaves the tree; may be null. Must not touch the tree.
     void (*release)(void* value) = nullptr;
-    /// Makes nodes, which `std::free` frees; null means `std::malloc`. May return null: there is no memory.
+    /// Allocates nodes, which are released by `std::free`; null means `std::malloc`. Returns null if no memory is left.
     void* (*allocate)(std::size_t size) = nullptr;
 };
 
@@ -29,8 +29,8 @@ struct critbit_tree {
 int critbit_contains(const critbit_tree& tree, std::string_view key, void** value);
 
 /// Returns 2 if the key was added. Returns 1 if it existed with another value, which is replaced (and the old value
-/// released) only if the lowest bit of `replace` is set. Returns 0, and changes nothing, if it existed with this very
-/// value, if there is no memory, or if it can't be a key: it holds a NUL or is 4 GiB long.
+/// released) only if the lowest bit of `replace` is set. Returns 0, and changes nothing, if it existed with the same
+/// value, if no memory is left, or if it is an invalid key: it holds a NUL or is 4 GiB long.
 int critbit_insert(critbit_tree& tree, std::string_view key, void* value, int replace);
 
 /// Removes the key, releases its value and returns 1; returns 0 if it is absent.
@@ -39,7 +39,7 @@ int critbit_delete(critbit_tree& tree, std::string_view key);
 /// Removes all keys in order, and releases each value.
 void critbit_clear(critbit_tree& tree);
 
-/// Receives a key of the tree, NUL-terminated and in place: valid until it is removed. Returns 1 to go on, 0 to stop.
+/// Receives a key of the tree, NUL-terminated; valid until the key is removed. Returns 1 to continue, 0 to stop.
 using critbit_callback = int (*)(const char* key, void* context);
 
 /// Calls back for every key that begins with `prefix` (for every key if that is empty), in ascending order of bytes.
