@@ -38,7 +38,7 @@ std::optional<JsonDocument> parsed(std::string_view json)
     return std::nullopt;
 }
 
-/// The list inside the resource: "version" a text, "apps" a dictionary. None for anything else.
+/// Returns the list inside the resource: "version" is a text, "apps" a dictionary. Returns nothing for anything else.
 std::optional<JsonDocument> innerList(std::string_view whitelist)
 {
     const auto outer = parsed(whitelist);
@@ -49,7 +49,7 @@ std::optional<JsonDocument> innerList(std::string_view whitelist)
     return inner;
 }
 
-/// The number of an application, from its entries in the list: the last counts.
+/// Returns the number of an application: the one in the last of its entries in the list.
 std::optional<std::uint32_t> encodingId(std::string_view identifier, const Value& entries)
 {
     if (entries.count() == 0 || !entries.asArray()) return std::nullopt;
@@ -57,7 +57,7 @@ std::optional<std::uint32_t> encodingId(std::string_view identifier, const Value
     if (!number.isNumber()) return std::nullopt;
     const auto id = number.asInt();
     if (!id || *id < 0 || *id > kMaximumEncodingId) {
-        log().error("encoding id {} of {} is no whole number from 0 to {}", platform::toJson(number), identifier,
+        log().error("encoding id {} of {} is not a whole number from 0 to {}", platform::toJson(number), identifier,
                     kMaximumEncodingId);
         return std::nullopt;
     }

@@ -15,18 +15,18 @@ namespace tavrin {
 
 struct Assembly;
 
-/// Computes the signature of the installed applications that the allow-list, the resource "TAVInstalledAppWhitelist",
-/// names.
+/// Computes the signature of those installed applications that are on the allow-list, the resource
+/// "TAVInstalledAppWhitelist".
 ///
-/// The signature is kept in the user defaults. It is computed at start-up if none is stored, and whenever applications
-/// come or go; a new allow-list alone is no reason. One computation runs at a time, on a background queue; requests in
-/// the meantime are dropped. Any thread.
+/// The signature is stored in the user defaults. It is computed at start-up if none is stored, and whenever an
+/// application is installed or removed; a new allow-list alone does not trigger it. One computation runs at a time, on
+/// a background queue; requests during a computation are dropped. Any thread.
 class AppWhitelistController : public std::enable_shared_from_this<AppWhitelistController> {
 public:
     static std::shared_ptr<AppWhitelistController> make(Assembly& assembly);
     explicit AppWhitelistController(Assembly& assembly);
 
-    /// Returns the base64 text, or the empty string.
+    /// Returns the signature as base64 text; empty before the first computation and after a failed one.
     [[nodiscard]] std::string whitelistSignature() const;
 
 private:
@@ -40,9 +40,9 @@ private:
     std::atomic<bool> _generating = false;
 };
 
-/// Returns the signature of the installed applications by an allow-list (JSON, at most 32 MiB); nothing if that is no
-/// allow-list of the known encoding or none of its applications is installed. Reads the applications only if the list
-/// is valid. Takes time: background queues only.
+/// Returns the signature of the installed applications by an allow-list (JSON, at most 32 MiB); nothing if the text is
+/// not an allow-list in the known encoding, or if none of its applications is installed. Reads the applications only if
+/// the list is valid. Slow: call it on background queues only.
 [[nodiscard]] std::optional<std::string> processWhitelist(std::string_view whitelist,
                                                           platform::InstalledApplications& installed);
 

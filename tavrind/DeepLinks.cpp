@@ -11,7 +11,7 @@ namespace tavrin {
 namespace {
 
 constexpr std::size_t kLongestLink = 64u << 10;
-// What stands in a host and in a path as it is, beside letters and digits (RFC 3986, 3.2.2 and 3.3).
+// Characters that need no escape in a host or a path, besides letters and digits (RFC 3986, sections 3.2.2 and 3.3).
 constexpr std::string_view kUnreserved = "-._~";
 constexpr std::string_view kHostMarks = "!$&'()*+,;=";
 constexpr std::string_view kPathMarks = "!$&'()*+,;=:@/";
@@ -39,7 +39,8 @@ std::string encoded(std::string_view text, std::string_view marks)
     return result;
 }
 
-/// Undoes needless escapes and encodes what isn't encoded; the other escapes stay, and so what they hide.
+/// Decodes needless escapes and encodes characters that need an escape. Keeps all other escapes: decoding them would
+/// change the path's meaning.
 std::string normalizedPath(std::string_view path)
 {
     std::string result;
@@ -53,7 +54,7 @@ std::string normalizedPath(std::string_view path)
     return result;
 }
 
-/// The host of an authority; nothing if it isn't valid.
+/// Returns the host of an authority; nothing if the authority is invalid.
 std::optional<std::string> hostOf(std::string_view authority)
 {
     if (const auto at = authority.rfind('@'); at != std::string_view::npos) authority.remove_prefix(at + 1);
@@ -68,7 +69,7 @@ std::optional<std::string> hostOf(std::string_view authority)
     return address ? std::optional(platform::lowerCased(host)) : std::nullopt;
 }
 
-/// The text of a link as it is recorded; empty for a text that isn't a link.
+/// Returns the recorded form of a link; empty if the text is not a link.
 std::string recordedLink(std::string_view link)
 {
     const auto components = deepLinkComponents(platform::trimmed(link));

@@ -12,26 +12,26 @@
 
 namespace tavrin {
 
-/// The parts of a link (RFC 3986, 3) that say where it leads. All of it is ASCII: characters that a URL can't hold are
-/// percent-encoded, and characters that need no escape are not escaped.
+/// The parts of a link that identify its target (RFC 3986, section 3), in ASCII. Characters that a URL can't contain
+/// are percent-encoded; characters that need no escape are not escaped.
 struct DeepLinkComponents {
     std::string scheme; ///< lower-case
     std::string host;   ///< lower-case; empty if the link has none
     std::string path;
 };
-/// Returns nothing for a text that isn't an absolute URL, has control characters or a port that is no number, or is
-/// longer than 64 KiB.
+/// Parses a link. Returns nothing if the text is not an absolute URL, has control characters or a port that is not a
+/// number, or is longer than 64 KiB.
 [[nodiscard]] std::optional<DeepLinkComponents> deepLinkComponents(std::string_view link);
-/// Host and path, without a leading "www." and trailing "/".
+/// Returns host and path, without a leading "www." and without trailing "/".
 [[nodiscard]] std::string tavrin_normalizedURLStringForDeepLinkIngest(const DeepLinkComponents& link);
 
-/// The links of one activity of an application, one or two.
+/// The one or two links of an application's activity.
 struct DeepLinkEntry {
     std::string bundleIdentifier;
     std::vector<std::string> links;
 };
 
-/// Links by application, as they are recorded.
+/// The links to record, by application.
 using DeepLinkSubmission = std::map<std::string, std::set<std::string>>;
 
 struct FilteredDeepLinks {
@@ -42,19 +42,19 @@ struct FilteredDeepLinks {
     int bundleIdentifiers = 0;
 };
 
-/// What becomes of activities on their way to the privacy recorder: pure functions.
+/// The steps from activities to the privacy recorder's input. Pure functions, any thread.
 struct DeepLinks {
     using List = std::set<std::string, std::less<>>;
 
-    /// The links of the activities that are open to everyone and have any.
+    /// Returns the links of those public activities that have any.
     [[nodiscard]] static std::vector<DeepLinkEntry> deepLinksFor(const std::vector<platform::AppActivity>& events);
-    /// Keeps the links of applications on the whitelist, as their normalised texts in lower case, but for those on the
-    /// blacklist; of all other applications the identifier alone, unless that is on the blacklist.
+    /// For an application on the whitelist, returns its normalised links in lower case, without those on the blacklist.
+    /// For any other application, returns only its identifier, unless that is on the blacklist.
     [[nodiscard]] static FilteredDeepLinks _normalizeAndFilterDeepLinks(const std::vector<DeepLinkEntry>& entries,
                                                                         const List& blacklist, const List& whitelist);
     [[nodiscard]] static bool _isUniversalLink(const DeepLinkComponents& link);
     static void save(const std::string& key, std::string link, DeepLinkSubmission& submission);
-    /// Returns the applications in a random order, so that a run that ends early doesn't always leave out the same.
+    /// Returns the applications in a random order, so that runs that end early don't always omit the same ones.
     [[nodiscard]] static std::vector<std::string> recordingOrder(const DeepLinkSubmission& submission,
                                                                  std::mt19937_64& random);
 };

@@ -30,7 +30,7 @@ constexpr const char* kDirectory = "com.quorvane.tavrind";
 constexpr const char* kDelayKey = "TAVDownloadDelay"; // for development
 constexpr std::int64_t kDelay = 60;                   // seconds
 constexpr std::int64_t kLongestDelay = 24 * 60 * 60;
-/// How long a bag waits for the list of downloads that it replaces.
+/// Time limit for the list of downloads that a bag cancels.
 constexpr std::chrono::seconds kLongestWait(60);
 
 const platform::Log& log()
@@ -79,7 +79,7 @@ DownloadManager::DownloadManager(Assembly& assembly)
     : _assembly(assembly),
       _queue(assembly.device.serialQueue("com.quorvane.tavrin.DownloadManager", platform::Priority::Background))
 {
-    _loadResources(); // for readers that come before `_start`
+    _loadResources(); // for readers before `_start`
 }
 
 DownloadManager::~DownloadManager() = default;
@@ -144,7 +144,7 @@ void DownloadManager::_handleSignificantLocationChange()
 
 void DownloadManager::_start()
 {
-    // Whoever comes second finds the loading queued ahead of what it queues itself.
+    // A concurrent caller returns after the loading is queued, so its own tasks run later.
     std::call_once(_started, [this] {
         log().log("started");
         _queue->async([weak = weak_from_this()] {
@@ -199,7 +199,7 @@ void DownloadManager::_downloadBagResources(const std::shared_ptr<const TAVBag>&
         const auto self = weak.lock();
         if (!self) return;
         const bool arrived = list->arrived.signalled();
-        if (!arrived) log().error("the list of downloads didn't arrive, none is cancelled");
+        if (!arrived) log().error("the list of downloads did not arrive in time, cancelling none");
         self->_replaceDownloads(arrived ? std::move(list->tasks) : decltype(list->tasks)(), *bag);
     });
 }
@@ -243,7 +243,7 @@ void DownloadManager::_addResource(const std::string& identifier, const std::opt
 void DownloadManager::_startPending(const std::string& identifier, std::uint64_t timer)
 {
     const auto pending = _pending.find(identifier);
-    if (pending == _pending.end() || pending->second.timer != timer) return; // called off
+    if (pending == _pending.end() || pending->second.timer != timer) return; // cancelled
     const Url url = std::move(pending->second.url);
     _pending.erase(pending);
     const auto found = _resources.find(identifier);
@@ -257,16 +257,16 @@ void DownloadManager::_downloadResource(const DownloadResource& resource, const 
 {
     UrlRequest request = _createDownloadRequest(resource, url);
     log().log("starting download of {} reason: {} delay: {:f} headers: {}", url.string(), reason,
-              platform::toSeconds(_delay()), platform::Private{textOf(request.headers)}); // they may tell the place
+              platform::toSeconds(_delay()), platform::Private{textOf(request.headers)}); // may reveal the location
     const auto task = _assembly.downloadURLSession->downloadTask(std::move(request));
     if (!task) return log().error("download task error {}", task.error().description());
-    (*task)->setNote(url.string()); // the request's URL has the service's items too
+    (*task)->setNote(url.string()); // the request's URL has more query items
     (*task)->resume();
 }
 
 UrlRequest DownloadManager::_createDownloadRequest(const DownloadResource& resource, const Url& url) const
 {
-    // Without the file, a 304 would be of no use.
+    // Without the file, a 304 would leave the resource missing.
     const std::string version = _fileExists(resource.identifier) ? _resourceVersion(resource) : "";
     UrlRequest request =
         _assembly.requestFactory->fileDownloadRequest(url, version, isLookupResource(resource.identifier));
@@ -365,7 +365,7 @@ void DownloadManager::_noteReceived(const std::string& identifier, const Value& 
 {
     _queue->assertOnQueue();
     const auto found = _resources.find(identifier);
-    if (found == _resources.end()) { // no longer in the bag, or forgotten for another place
+    if (found == _resources.end()) { // no longer in the bag, or deleted after a move
         log().error("could not find resource for download identifier: {} url: {}", identifier, request.url.string());
         return logTaskError(fmt::format("can't find {}", identifier));
     }
@@ -374,7 +374,7 @@ void DownloadManager::_noteReceived(const std::string& identifier, const Value& 
     if (response.url != request.url)
         resource.redirectUrl = response.url;
     else if (response.statusCode == 200)
-        resource.redirectUrl.reset(); // a 304 keeps the old copy, and with it where that came from
+        resource.redirectUrl.reset(); // a 304 keeps the old copy and its origin
     log().log("{} url: {}", identifier, response.url.string());
     _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.resourcefilesfetched");
     _saveResources();
@@ -394,7 +394,7 @@ void DownloadManager::taskDidComplete(const std::shared_ptr<platform::Background
     else if (response->statusCode != 200 && response->statusCode != 304)
         reason = fmt::format("status code {}", response->statusCode);
     else
-        return; // noted with the file
+        return; // handled by taskDidFinishDownloading
     logTaskError(reason);
 }
 

@@ -24,53 +24,55 @@ namespace tavrin {
 struct Assembly;
 class TAVBag;
 
-/// A resource's file was replaced: "identifier" (std::string) and "url" (std::filesystem::path, the file).
+/// Posted after a resource's file was replaced, with "identifier" (std::string) and "url" (std::filesystem::path of the
+/// file).
 inline constexpr const char* TAVFileDownloadCompletedNotification = "TAVFileDownloadCompletedNotification";
-/// A resource was deleted, or must be fetched again for another place: "identifier".
+/// Posted after a resource was deleted, or is to be fetched again because the location changed, with "identifier".
 inline constexpr const char* TAVFileDeletedNotification = "TAVFileDeletedNotification";
 
-/// What the download manager needs to know of lookup hints, from whoever installs them. Any thread.
+/// What the download manager needs to know about lookup hints. Implemented by the service that installs them. Any
+/// thread.
 class LookupResources {
 public:
     virtual ~LookupResources() = default;
     [[nodiscard]] virtual bool lookupEnabled() const = 0;
-    /// The version of the hints at a URL; nothing if the URL has none.
+    /// Returns the version of the hints at a URL; nothing if the URL has none.
     [[nodiscard]] virtual std::optional<std::string> signatureFromURL(const platform::Url& url) const = 0;
 };
 
 /// Keeps a local copy of each resource file that the bag lists.
 ///
-/// Every bag cancels the downloads that are under way and checks each resource for a reason to be downloaded
-/// (`downloadReason`). A download starts 60 s later (the user default "TAVDownloadDelay", if it is set), if the reason
-/// still holds; a bag that comes meanwhile updates its URL. The session has a day to carry it out, across restarts: a
-/// download of an earlier process goes on until there is a bag, which may be the one on disk; what has arrived by then
-/// is installed all the same. An answer of status 200 replaces the file in one step, 304 leaves it; only then is the
-/// resource's URL noted, so a download that failed has its reason again with the next bag. A resource that the bag no
-/// longer lists is deleted.
+/// Each new bag cancels the running downloads and checks whether each resource needs a download (`downloadReason`). If
+/// so, the download starts 60 s later (or after the user default "TAVDownloadDelay", in seconds) if the reason still
+/// holds then; a bag that arrives before that updates the URL. The session carries out a download within a day, across
+/// restarts. A download of an earlier process continues until the first bag, which may be the one on disk; if it ends
+/// before that, its file is installed. Status 200 replaces the file atomically, and 304 keeps it. Only then is the
+/// resource's URL stored, so the next bag repeats a failed download. A resource that the bag no longer lists is
+/// deleted.
 ///
 /// Any thread.
 class DownloadManager : public platform::BackgroundSessionDelegate,
                         public std::enable_shared_from_this<DownloadManager> {
 public:
-    /// Begins to follow the bag.
+    /// Creates the manager and starts observing the bag and the location.
     static std::shared_ptr<DownloadManager> make(Assembly& assembly);
     explicit DownloadManager(Assembly& assembly);
     ~DownloadManager() override;
 
-    /// Until this is called, lookups count as enabled, and their hints have no version.
+    /// Sets the source of facts about lookup hints. Until then, lookups count as enabled, and hints have no version.
     void setLookupResources(std::weak_ptr<LookupResources> lookupResources);
 
-    /// What the last change left; never waits for one that is under way.
+    /// Returns a resource as of the last complete change. Does not block.
     [[nodiscard]] std::optional<DownloadResource> resourceForKey(const std::string& identifier) const;
-    /// Resource identifier to version, for resources that have a version. Never waits either: every new session asks.
+    /// Returns the versions of the resources that have one, by identifier. Does not block: every new session calls it.
     [[nodiscard]] platform::Dictionary resourceVersions() const;
 
     struct Resource {
         platform::FileHandle file;
         platform::Value attributes; ///< dictionary: "size" (bytes), "modified" and "created" (dates)
     };
-    /// Returns a handle of its own for each call, which keeps reading the same file when that is replaced. Fails with
-    /// error 404 if the resource isn't there, and 500 if it can't be read.
+    /// Opens a resource. Each call returns a new handle, which still reads the same content after a replacement. Fails
+    /// with error 404 if the resource is missing, and with 500 if it can't be read.
     [[nodiscard]] platform::Result<Resource> fileHandleForResource(const std::string& identifier) const;
 
     // From the download session, on its delegate queue.
@@ -82,12 +84,12 @@ public:
 
 private:
     enum class File { Keep, Remove };
-    /// A download whose delay runs.
+    /// A download that waits for its delay.
     struct Pending {
         platform::Url url;       ///< the latest; a later bag may replace it
-        std::uint64_t timer = 0; ///< a timer of another number was called off
+        std::uint64_t timer = 0; ///< identifies the valid timer; others were cancelled
     };
-    /// What any thread may read: replaced whole, never changed.
+    /// A snapshot for any thread. It is replaced as a whole and never modified.
     struct Published {
         DownloadResources resources;
         platform::Dictionary versions;

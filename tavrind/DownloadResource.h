@@ -10,7 +10,7 @@
 
 namespace tavrin {
 
-/// A downloadable resource, and where its file came from.
+/// A downloadable resource and the origin of its file.
 struct DownloadResource {
     std::string identifier;
     /// The bag's URL when the file was received or confirmed (304); nothing before that.
@@ -23,18 +23,19 @@ struct DownloadResource {
 
 using DownloadResources = std::map<std::string, DownloadResource, std::less<>>;
 
-/// The table of resources as it is kept in the user defaults: identifier → {"url", "redirect_url"}. Reading skips
-/// unknown identifiers and invalid URLs.
+/// Convert the table of resources to its form in the user defaults and back: identifier → {"url", "redirect_url"}.
+/// Reading skips unknown identifiers and invalid URLs.
 [[nodiscard]] platform::Value valueOf(const DownloadResources& resources);
 [[nodiscard]] DownloadResources resourcesIn(const platform::Value& value);
 
-/// Whether an identifier names a downloadable resource. Only these become file names.
+/// Returns whether an identifier names a downloadable resource. Only such identifiers are used as file names.
 [[nodiscard]] bool isResource(std::string_view identifier);
-/// Lookup hints: fetched again with every bag, while lookups are enabled, and with the location.
+/// Returns whether an identifier names lookup hints. While lookups are enabled, hints are fetched again with every bag;
+/// their requests contain the location.
 [[nodiscard]] bool isLookupResource(std::string_view identifier);
 
-/// Why a resource that the bag has at `url` must be downloaded: "update", "missing" or "lookup"; nothing if it needn't
-/// be.
+/// Returns why a resource that the bag lists at `url` must be downloaded: "update", "missing" or "lookup". Returns
+/// nothing if it need not be downloaded.
 [[nodiscard]] std::optional<std::string_view> downloadReason(const DownloadResource& resource, const platform::Url& url,
                                                              bool fileExists);
 

@@ -78,7 +78,7 @@ float jaccardIndex(const Words& a, const Words& b)
     return all == 0 ? 0 : static_cast<float>(shared) / static_cast<float>(all);
 }
 
-/// The text around the word that is looked up, which results are measured against.
+/// The text around the looked-up word. Decides which results fit it.
 class LookupContext {
 public:
     LookupContext(std::string_view text, const std::string& locale)

@@ -20,8 +20,8 @@ struct TAVLookupRequest;
 
 /// Installs downloaded lookup hints in the device's data-detector store.
 ///
-/// A hints file is installed after its download, and removed after its deletion. At start-up, files of which the store
-/// has another version are installed again. Failures are logged; the next try is the next start-up. Any thread.
+/// A hints file is installed after its download and removed after its deletion. At start-up, a file is installed again
+/// if the store has another version. Failures are logged; the next start-up tries again. Any thread.
 class Lookup : public LookupResources, public std::enable_shared_from_this<Lookup> {
 public:
     /// Kinds of source in the data-detector store.
@@ -33,13 +33,14 @@ public:
 
     /// Returns true unless the shared setting "LookupSuggestionsDisabled" is true.
     [[nodiscard]] bool lookupEnabled() const override;
-    /// Returns "c-d-b" for a path that begins with /a/b/c/d. A shorter path is logged, and returns nothing.
+    /// Returns "c-d-b" for a path that begins with /a/b/c/d. Logs a shorter path and returns nothing.
     [[nodiscard]] std::optional<std::string> signatureFromURL(const platform::Url& url) const override;
 
-    /// Removes from a decoded answer, an array of result sets, the results whose "lookup_instructions" don't fit the
-    /// text around the looked-up word: the keywords found there weigh too little, the completion doesn't occur, or too
-    /// few words occur in the subject, too. Texts are compared by `locale` ("de_CH") regardless of case, words of the
-    /// subject exactly. Results without instructions stay.
+    /// Filters a decoded answer, an array of result sets: removes the results whose "lookup_instructions" don't fit the
+    /// text around the looked-up word. The reasons are that the keywords in the text weigh too little, that it does not
+    /// contain the completion, or that it shares too few words with the subject. Keywords and completion are searched
+    /// by the rules of `locale` ("de_CH"), ignoring case; words of the subject must be equal. Results without
+    /// instructions stay.
     static void filterLookupResultsWithRequest(const TAVLookupRequest& request, platform::Value& response,
                                                const std::string& locale);
 

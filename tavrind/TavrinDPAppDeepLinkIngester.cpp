@@ -130,11 +130,11 @@ void TavrinDPAppDeepLinkIngester::_record(const DeepLinkSubmission& submission)
         const std::set<std::string>& links = submission.at(identifier);
         const auto recorded = recorder.record(fmt::format("{}.{}", appDeepLinkKey, identifier), links);
         if (!recorded) {
-            log().log("deep links are not recorded: {}", recorded.error().description());
+            log().log("deep links not recorded: {}", recorded.error().description());
             counters.addValue(1, "com.quorvane.tavrind.dp.record.app.failure");
             break;
         }
-        const auto count = static_cast<std::int64_t>(*recorded); // less than all when the budget runs out
+        const auto count = static_cast<std::int64_t>(*recorded); // fewer than all if the budget is spent
         counters.addValue(count, "com.quorvane.tavrind.dp.sentlinks.app");
         counters.addValue(1, "com.quorvane.tavrind.dp.record.app.success");
         sent += count;

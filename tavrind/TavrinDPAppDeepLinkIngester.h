@@ -13,23 +13,23 @@ namespace tavrin {
 
 struct Assembly;
 
-/// Twice a day, while nobody uses the device, tells the privacy recorder (docs/privacy.md) which content of which
-/// applications was used in the last 24 hours.
+/// Twice a day, while the device is not in use, reports the content that applications showed in the last 24 hours to
+/// the privacy recorder (docs/privacy.md).
 class TavrinDPAppDeepLinkIngester : public std::enable_shared_from_this<TavrinDPAppDeepLinkIngester> {
 public:
-    /// What the recorder's keys begin with.
+    /// Prefix of the recorder's keys.
     static constexpr std::string_view appDeepLinkKey = "com.quorvane.tavrin.AppDeepLink";
-    /// Where the database of activities is, in the user's data directory.
+    /// Directory of the database of activities, relative to the user's data directory.
     static constexpr std::string_view knowledgeDirectoryPath = "com.quorvane.tavrind/knowledge";
-    /// The recorder's directory, in the user's state directory.
+    /// Directory of the recorder, relative to the user's state directory.
     static constexpr std::string_view kRecorderDirectory = "com.quorvane.tavrind/privacy";
 
-    /// `seed` is chance's: it decides in which order applications are recorded.
+    /// `seed` determines the order in which applications are recorded; pass a random number.
     TavrinDPAppDeepLinkIngester(Assembly& assembly, std::uint64_t seed) : _assembly(assembly), _random(seed) {}
 
     /// Registers the periodic task. Any thread.
     void scheduleMaintenance();
-    /// Records the activities that began in that time. One call at a time.
+    /// Records the activities that began between `start` and `end`. One call at a time.
     void ingestStartingOn(platform::Date start, platform::Date end);
 
 private:
@@ -40,7 +40,7 @@ private:
     void _record(const DeepLinkSubmission& submission);
 
     Assembly& _assembly;
-    std::mt19937_64 _random; // of the run
+    std::mt19937_64 _random; // used by runs only
 };
 
 } // namespace tavrin

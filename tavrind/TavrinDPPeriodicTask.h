@@ -15,20 +15,20 @@ namespace tavrin {
 
 struct Assembly;
 
-/// Work to be done now and then, when nobody uses the device. Constant once made: any thread.
+/// Periodic work that runs while the device is not in use. Immutable: any thread.
 class TavrinDPPeriodicTask {
 public:
     using Handler = std::function<void()>;
 
-    /// A task that is due every `period` seconds, five at least. Null without a name or a handler.
+    /// Creates a task that is due every `period` seconds, at least 5. Returns null without a name or a handler.
     [[nodiscard]] static std::shared_ptr<const TavrinDPPeriodicTask>
     taskWithName(Assembly& assembly, std::string name, std::uint64_t period, Handler handler);
 
-    /// Its activity's identifier too.
+    /// Returns the name, which is also the identifier of the activity.
     [[nodiscard]] const std::string& name() const { return _name; }
     [[nodiscard]] std::uint64_t periodSeconds() const { return _periodSeconds; }
     [[nodiscard]] const Handler& handler() const { return _handler; }
-    /// What the handler runs on.
+    /// Returns the queue on which the handler runs.
     [[nodiscard]] const std::shared_ptr<platform::Queue>& queue() const { return _queue; }
     [[nodiscard]] const platform::ActivityCriteria& executionCriteria() const { return _executionCriteria; }
 

@@ -62,7 +62,7 @@ void TavrinDPPeriodicTaskManager::registerTask(std::shared_ptr<const TavrinDPPer
 
 void TavrinDPPeriodicTaskManager::unregisterTask(const TavrinDPPeriodicTask& task)
 {
-    const std::string name = task.name(); // the task may go here
+    const std::string name = task.name(); // the next line may destroy the task
     _queue->sync([&] { _allTasks.erase(name); });
     TavrinXPCActivity::unregister(_assembly, name);
 }

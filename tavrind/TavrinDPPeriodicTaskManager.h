@@ -13,17 +13,18 @@ namespace tavrin {
 struct Assembly;
 class TavrinDPPeriodicTask;
 
-/// Keeps the periodic tasks and has the device run them. Any thread.
+/// Owns the periodic tasks and registers them with the device's scheduler. Any thread.
 class TavrinDPPeriodicTaskManager {
 public:
     using Tasks = std::map<std::string, std::shared_ptr<const TavrinDPPeriodicTask>>;
 
     explicit TavrinDPPeriodicTaskManager(Assembly& assembly);
 
-    /// Has the task run from now on, in place of one of that name. A run under way when its task goes ends on its own.
+    /// Registers the task, in place of one with the same name. A run of a removed or replaced task continues to its
+    /// end.
     void registerTask(std::shared_ptr<const TavrinDPPeriodicTask> task);
     void unregisterTask(const TavrinDPPeriodicTask& task);
-    /// By name.
+    /// Returns the tasks by name.
     [[nodiscard]] Tasks allTasks() const;
 
 private:

@@ -23,7 +23,7 @@ const platform::Log& log()
     return TavrinLogForCategory(kLogSubscription);
 }
 
-/// A number, or a text that is one.
+/// Returns a finite number, given as a number or as text.
 std::optional<double> secondsIn(const Value& value)
 {
     std::optional<double> seconds = value.asDouble();

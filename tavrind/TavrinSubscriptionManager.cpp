@@ -26,12 +26,12 @@ const platform::Log& log()
 
 std::string subscriptionsHeader(const std::vector<Value>& subscriptions)
 {
-    constexpr std::size_t kLongest = 4096; // half of what common servers take of all headers
+    constexpr std::size_t kLongest = 4096; // half of what common servers accept for all headers
     std::string header;
     for (const Value& subscription : subscriptions) {
         const std::string entry = (header.empty() ? "[" : ",") + platform::toJson(subscription);
         if (header.size() + entry.size() + 1 > kLongest)
-            log().error("subscription with {} is not sent: the header has at most {} bytes",
+            log().error("not sending the subscription with {}: the header has at most {} bytes",
                         platform::toJson(subscription["provider"]), kLongest);
         else
             header += entry;

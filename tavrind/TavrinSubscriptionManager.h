@@ -18,34 +18,35 @@ namespace tavrin {
 struct Assembly;
 class TAVBag;
 
-/// Receives what the subscription manager finds out, on the manager's queue.
+/// Receives the results of the subscription manager, on the manager's queue.
 class TavrinSubscriptionManagerDelegate {
 public:
     virtual ~TavrinSubscriptionManagerDelegate() = default;
     virtual void didUpdateStorefrontIdentifier(const std::optional<std::string>& storefront) = 0;
-    /// One dictionary for each provider, "fuse" first. An empty list removes the header.
+    /// `subscriptions` has one dictionary for each provider, "fuse" first; an empty list removes the header.
     virtual void didUpdateSubscriptionDictionaries(const std::vector<platform::Value>& subscriptions) = 0;
 };
 
-/// The request header that tells the service the subscriptions: a JSON array, or nothing for none.
+/// Returns the request header that lists the subscriptions: a JSON array, or an empty text if there are none.
 ///
-/// Servers refuse requests with large headers, so this one has at most 4 KiB. Subscriptions that no longer fit are left
-/// out whole, and logged. Any thread.
+/// Servers refuse requests with large headers, so this one has at most 4 KiB. A subscription that does not fit is left
+/// out completely, and logged. Any thread.
 [[nodiscard]] std::string subscriptionsHeader(const std::vector<platform::Value>& subscriptions);
 
-/// Gathers the user's content subscriptions that the bag lets requests tell, and the media store's storefront.
+/// Collects the user's content subscriptions that requests may report, and the media store's storefront.
 ///
-/// Subscriptions are those with the providers that the bag lists, and the maker's own news subscription, "fuse". They
-/// are gathered again after every new bag and whenever the device's profile or a provider's statement changes. A bag
-/// without its two lists of providers leaves none. Any thread.
+/// These are the subscriptions with the providers that the bag lists, and the maker's news subscription, "fuse". They
+/// are collected again after every new bag and whenever the device's profile or a provider's statement changes. If the
+/// bag lacks one of its two lists of providers, there are none. Any thread.
 class TavrinSubscriptionManager : public std::enable_shared_from_this<TavrinSubscriptionManager> {
 public:
-    /// Starts observing these and tells the delegate the storefront. The assembly must outlive the manager.
+    /// Starts observing the bag, the profile and the providers, and reports the storefront to the delegate. The
+    /// assembly must outlive the manager.
     static std::shared_ptr<TavrinSubscriptionManager> make(Assembly& assembly,
                                                            std::weak_ptr<TavrinSubscriptionManagerDelegate> delegate);
     TavrinSubscriptionManager(Assembly& assembly, std::weak_ptr<TavrinSubscriptionManagerDelegate> delegate);
 
-    /// One dictionary for each provider, "fuse" first.
+    /// Returns one dictionary for each provider, "fuse" first.
     [[nodiscard]] std::vector<platform::Value> subscriptions() const;
 
 private:

@@ -88,7 +88,7 @@ platform::Result<AppSignature> readSignature(std::string_view text)
     const bool compressed = (version & 0x8000) != 0;
     if (!compressed && buffer.size() != kDigestTail + length) return malformed("the bitmap's length differs");
     auto bitmap = rle_expand(buffer, kDigestTail, buffer.size() - kDigestTail, length, compressed);
-    if (!bitmap) return malformed("the runs are not of that bitmap");
+    if (!bitmap) return malformed("the runs don't fit the bitmap");
 
     std::array<unsigned char, EVP_MAX_MD_SIZE> digest{};
     unsigned size = 0;

@@ -8,7 +8,7 @@
 
 #include "platform/values/Error.h"
 
-// The inverse of encoder.h, as a service reads signatures; the daemon only writes them. Pure functions: any thread.
+// Decodes the signatures of encoder.h, as a service does. The daemon only writes them. Pure functions: any thread.
 
 namespace tavrin {
 

@@ -54,12 +54,12 @@ bool bitAt(std::string_view bitmap, std::size_t bit)
     return (static_cast<unsigned char>(bitmap[bit / 8]) & 0x80u >> bit % 8) != 0;
 }
 
-/// How many bits from `bit` on have this value; a longest run at most.
+/// Returns the number of consecutive bits from `bit` on that have this value, at most `kLongestRun`.
 std::size_t runFrom(std::string_view bitmap, std::size_t bit, bool value)
 {
     const std::size_t last = std::min(bit + kLongestRun, bitmap.size() * 8);
     for (std::size_t at = bit; at < last; at = at / 8 * 8 + 8) {
-        // What differs from the value, from this bit of its byte on.
+        // The bits of this byte, from `at` on, that differ from the value.
         const auto differing = static_cast<unsigned char>((bitmap[at / 8] ^ (value ? 0xff : 0)) & 0xff >> at % 8);
         if (differing != 0)
             return std::min(at / 8 * 8 + static_cast<std::size_t>(std::countl_zero(differing)), last) - bit;
@@ -67,7 +67,7 @@ std::size_t runFrom(std::string_view bitmap, std::size_t bit, bool value)
     return last - bit;
 }
 
-/// The last two bytes of a version in hexadecimal, as one number.
+/// Returns the last two bytes of a version in hexadecimal as one number; nothing if the text is not hexadecimal bytes.
 std::optional<unsigned> versionTail(std::string_view version)
 {
     if (version.size() % 2 != 0) return std::nullopt;

@@ -7,10 +7,10 @@ namespace tavrin {
 
 namespace {
 
-/// Twice what the longest resource, and many times what an image or a session, may have.
+/// In bytes: twice the largest resource, and many times the largest image or session.
 constexpr std::size_t kLargest = 64u << 20;
 
-/// Only a file of memfd_create has seals.
+/// Only files made by memfd_create have seals.
 bool isInMemory(const platform::FileHandle& file)
 {
     return fcntl(file.fd(), F_GET_SEALS) >= 0;

@@ -5,11 +5,12 @@
 
 namespace tavrin {
 
-/// Returns the bytes of a whole file. The handle may be closed at once. Fails with the system's error ("POSIX"): EINVAL
-/// for an empty file, EFBIG for one of more than 64 MiB, EIO for one that became shorter meanwhile.
+/// Returns the bytes of a whole file, which stay valid after the handle is closed. Fails with the system's error
+/// ("POSIX"): EINVAL for an empty file, EFBIG for one of more than 64 MiB, EIO for one that was truncated during the
+/// call.
 ///
-/// A nameless file in memory is mapped. Any other file is read: reading a mapping beyond the end of a file that another
-/// program cut short would kill the process.
+/// A nameless file in memory is mapped. Any other file is read, because another program may truncate it: reading a
+/// mapping beyond the end of its file kills the process (SIGBUS).
 [[nodiscard]] platform::Result<platform::Bytes> mmapFileHandle(const platform::FileHandle& file);
 
 } // namespace tavrin
