@@ -11,7 +11,7 @@
 
 namespace devserver {
 
-/// The bag that is served: this service's endpoints, with the overrides set by control calls. Any thread.
+/// The bag that the service sends: its own endpoints, with the overrides set by control calls. Any thread.
 class Bag {
 public:
     /// `base` is the service's own HTTPS address, "https://127.0.0.1:8443".
@@ -22,8 +22,8 @@ public:
 
     /// Raises the version by 1 and returns it.
     std::int64_t bump();
-    /// Gives all downloadable resources, or only the named one, a version above all of theirs, which changes their
-    /// URLs. Returns the version. The error says that no resource has the name.
+    /// Raises the version of the named resource, or gives all resources one version above all current ones, which
+    /// changes their URLs. Returns the version. The error says that no resource has the name.
     std::expected<std::int64_t, std::string> bumpResources(const std::string& name = "");
     /// Overrides the bag's keys with those of an object; null removes a key; an integer "version" sets the number that
     /// `bump` raises. The error says why: not an object, or more than 256 KiB of overrides.
@@ -35,7 +35,7 @@ private:
     const std::string _base;
     mutable std::mutex _mutex;
     std::int64_t _version = 1;
-    std::map<std::string, std::int64_t, std::less<>> _resourceVersions; ///< by resource
+    std::map<std::string, std::int64_t, std::less<>> _resourceVersions; ///< by name of the resource
     platform::Dictionary _overrides;
 };
 

@@ -50,7 +50,7 @@ Entry readRow(const Section& section, std::string_view row)
         std::from_chars(columns[1].data(), columns[1].data() + columns[1].size(), entry.popularity);
     if (error != std::errc() || end != columns[1].data() + columns[1].size() || entry.popularity < 1 ||
         entry.popularity > 1000)
-        throw std::runtime_error("the popularity is no number from 1 to 1000");
+        throw std::runtime_error("the popularity is not a number from 1 to 1000");
     entry.description = columns[2];
     entry.keywords = columns[3];
     entry.url = urlOf(section, entry.title);

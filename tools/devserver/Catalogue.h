@@ -18,19 +18,19 @@ struct Section {
 };
 
 struct Entry {
-    std::string identifier; ///< section and digest of the URL; independent of other entries
+    std::string identifier; ///< section and digest of the URL; does not depend on other entries
     const Section* section = nullptr;
     std::string title;
     std::string url;
     std::string description;
     unsigned popularity = 0; ///< 1 to 1000
-    std::string keywords;    ///< more words that match it
+    std::string keywords;    ///< further words that match the entry
     Folded foldedTitle;
     std::vector<Word> titleWords;
     std::vector<std::string> foldedKeywords;
 };
 
-/// All that the service can find: the tables of catalogue/, compiled in. Immutable, hence any thread.
+/// All entries that the service can find: the tables of catalogue/, compiled in. Immutable: any thread.
 class Catalogue {
 public:
     /// Throws std::runtime_error, naming table and line, if a row isn't "title, popularity, description, keywords".

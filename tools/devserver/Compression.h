@@ -6,13 +6,13 @@
 
 namespace devserver {
 
-/// A gzip stream that decompresses to `count` blanks.
+/// Returns a gzip stream that decompresses to `count` blanks.
 [[nodiscard]] std::string gzipOfBlanks(std::size_t count);
 
-/// A gzip stream (RFC 1952).
+/// Compresses to a gzip stream (RFC 1952).
 [[nodiscard]] std::string gzipPacked(std::string_view bytes);
 
-/// A zlib stream (RFC 1950), as in PNG.
+/// Compresses to a zlib stream (RFC 1950), as in PNG.
 [[nodiscard]] std::string zlibPacked(std::string_view bytes);
 
 } // namespace devserver

@@ -26,7 +26,7 @@ Answer done()
     return jsonAnswer(Value::dictionaryOf({{"done", true}}));
 }
 
-/// Names the first key of the body that isn't allowed; nullopt if all are.
+/// Returns an error text about the first key of the body that isn't allowed; nullopt if all are allowed.
 std::optional<std::string> unknownKey(const Value& body, const std::vector<std::string_view>& allowed)
 {
     for (const auto& [key, value] : *body.asDictionary())
@@ -46,7 +46,7 @@ std::optional<std::uint64_t> numberItem(const Request& request, std::string_view
     return number;
 }
 
-// ---- The calls. `body` is an object.
+// The calls. `body` is an object.
 
 Answer addFault(Service& service, const Value& body, const Request&)
 {
@@ -55,8 +55,8 @@ Answer addFault(Service& service, const Value& body, const Request&)
     const auto count = body["count"].isNull() ? 0 : body["count"].asUInt();
     if (!endpoint || !fault || !count)
         return errorAnswer(400,
-                           "give {\"endpoint\": \"search\", \"fault\": \"delay:400\", \"count\": 1}; count 0, or none, "
-                           "is until cleared");
+                           "give {\"endpoint\": \"search\", \"fault\": \"delay:400\", \"count\": 1}; with count 0, or "
+                           "without it, the fault lasts until cleared");
     const auto added = service.faults.add(*endpoint, *fault, *count);
     if (!added) return errorAnswer(400, added.error());
     return jsonAnswer(service.faults.list());
@@ -104,7 +104,8 @@ Answer bumpBag(Service& service, const Value&, const Request&)
 Answer bumpResources(Service& service, const Value& body, const Request&)
 {
     const std::string* name = body["name"].asString();
-    if (!name && !body["name"].isNull()) return errorAnswer(400, "\"name\" is a resource's name; without it all rise");
+    if (!name && !body["name"].isNull())
+        return errorAnswer(400, "\"name\" is a resource's name; without it, all versions are raised");
     const auto version = service.bag.bumpResources(name ? *name : "");
     if (!version) return errorAnswer(400, version.error());
     return jsonAnswer(Value::dictionaryOf({{"resource_version", *version}}));
@@ -198,8 +199,8 @@ Answer controlAnswer(Service& service, const Request& request)
     Value body = platform::Dictionary();
     if (!request.body.empty()) {
         auto parsed = platform::parseJson(request.body, kMaximumBody);
-        if (!parsed) return errorAnswer(400, "the body is no JSON: " + parsed.error().reason());
-        if (!parsed->asDictionary()) return errorAnswer(400, "the body is no JSON object");
+        if (!parsed) return errorAnswer(400, "the body is not JSON: " + parsed.error().reason());
+        if (!parsed->asDictionary()) return errorAnswer(400, "the body is not a JSON object");
         body = std::move(*parsed);
     }
     if (!call->anyKey)

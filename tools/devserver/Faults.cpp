@@ -22,7 +22,7 @@ namespace {
 struct KindEntry {
     std::string_view name;
     Kind kind;
-    std::string_view unit; // of the number; empty if it takes none
+    std::string_view unit; // of the number; empty if the kind has none
     std::uint64_t least = 0;
     std::uint64_t most = 0;
 };
@@ -74,7 +74,7 @@ std::expected<Fault, std::string> parseFault(std::string_view text)
     return fault;
 }
 
-/// The value with every leaf replaced by one of another type; keys and lengths stay.
+/// Returns the value with every leaf replaced by one of another type. Keys and lengths stay.
 Value wrongValue(const Value& value)
 {
     switch (value.type()) {
@@ -94,7 +94,7 @@ Value wrongValue(const Value& value)
     }
 }
 
-/// The service's address with its other host name: "https://localhost:8443" for a request to 127.0.0.1.
+/// Returns the service's address under its other host name: "https://localhost:8443" for a request to 127.0.0.1.
 std::string otherHost(const Request& request)
 {
     const std::string* host = findHeader(request.headers, "Host");

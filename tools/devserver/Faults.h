@@ -13,7 +13,7 @@
 
 namespace devserver {
 
-/// A fault that one request meets on demand.
+/// A fault that is applied to one request.
 struct Fault {
     enum class Kind {
         Delay,
@@ -45,21 +45,21 @@ struct Fault {
 /// Applies a fault to a finished answer. Delay, Hang and Endless change nothing here.
 void spoil(Answer& answer, const Fault& fault, const Request& request);
 
-/// The names of the endpoints, as used by faults, the log and the counters.
+/// Returns the names of the endpoints that faults, the log and the counters use.
 [[nodiscard]] const std::vector<std::string_view>& endpointNames();
 
-/// The rules that say which requests meet which faults, in the order of their arrival. Any thread.
+/// The rules that assign faults to requests, in the order of their addition. Any thread.
 class Faults {
 public:
     static constexpr std::size_t kMaximumCount = 100;
 
-    /// Adds a rule for the next `count` requests of an endpoint: one of `endpointNames()`, or "*" for all. A count of 0
-    /// lasts until `clear`. The error says what is allowed.
+    /// Adds a rule for the next `count` requests of an endpoint: one of `endpointNames()`, or "*" for all. With a count
+    /// of 0 the rule applies until `clear`. The error says what is allowed.
     std::expected<void, std::string> add(std::string_view endpoint, std::string_view fault, std::uint64_t count);
     /// Returns the faults of the first rule that matches the endpoint, and counts the rule down.
     [[nodiscard]] std::vector<Fault> take(std::string_view endpoint);
     void clear();
-    /// [{"endpoint", "fault", "left"}]; "left" 0 means until cleared.
+    /// Returns [{"endpoint", "fault", "left"}]; a "left" of 0 means until cleared.
     [[nodiscard]] platform::Value list() const;
     [[nodiscard]] std::size_t count() const;
 

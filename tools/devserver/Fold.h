@@ -9,7 +9,7 @@
 namespace devserver {
 
 /// A text folded for comparison, in UTF-8: without case and diacritics, with compatibility forms resolved, each run of
-/// white space replaced by one blank, and none in front.
+/// white space replaced by one blank, and no leading blank.
 struct Folded {
     std::string text;
     /// For each byte of `text`, and for its end: the position in the original of the character that it came from.
@@ -24,11 +24,11 @@ struct Word {
     std::size_t end = 0;
 };
 
-/// The words of a folded text, in order. A symbol or an emoji is a word; scripts without blanks are split by
-/// dictionary.
+/// Returns the words of a folded text, in order. A symbol or an emoji is a word. Text in scripts without blanks is
+/// split with a dictionary.
 [[nodiscard]] std::vector<Word> wordsOf(std::string_view folded);
 
-/// The text in lower case, by the rules of the root locale.
+/// Returns the text in lower case, by the rules of the root locale.
 [[nodiscard]] std::string lowerCased(std::string_view text);
 
 } // namespace devserver

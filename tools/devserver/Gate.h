@@ -9,7 +9,7 @@
 
 namespace devserver {
 
-/// Holds requests back for a time, or until they are released. Any thread.
+/// Delays requests for a time, or until they are released. Any thread.
 class Gate {
 public:
     Gate();
@@ -22,12 +22,12 @@ public:
 
     /// Wakes all current waiters.
     void release();
-    /// Wakes all waiters, and lets nobody wait from now on.
+    /// Wakes all waiters. From then on, `wait` returns at once.
     void close();
 
 private:
     std::mutex _mutex;
-    std::shared_ptr<platform::FileHandle> _event; // an eventfd, signalled once; then the next waiters get a new one
+    std::shared_ptr<platform::FileHandle> _event; // an eventfd, signalled once; later waiters get a new one
     bool _closed = false;
 };
 

@@ -10,12 +10,12 @@
 
 #include "platform/values/Value.h"
 
-/// HTTP as the service sees it. Only HttpServer.cpp knows the library that speaks it.
+/// HTTP requests and answers, independent of the HTTP library, which only HttpServer.cpp uses.
 namespace devserver {
 
 using Headers = std::vector<std::pair<std::string, std::string>>;
 
-/// The value of the first header of that name, compared case-insensitively; null if there is none.
+/// Returns the value of the first header of that name, ignoring case; null if there is none.
 [[nodiscard]] const std::string* findHeader(const Headers& headers, std::string_view name);
 
 struct Request {
@@ -28,7 +28,8 @@ struct Request {
     bool secure = false; ///< received over TLS
     int connection = -1; ///< the connection's socket, to notice that the peer left; -1 if unknown
 
-    /// The decoded value of the first query item of that name; nullopt if there is none. "+" is a blank, as in forms.
+    /// Returns the decoded value of the first query item of that name; nullopt if there is none. "+" decodes to a
+    /// blank, as in forms.
     [[nodiscard]] std::optional<std::string> item(std::string_view name) const;
 };
 
@@ -44,7 +45,7 @@ struct Answer {
 };
 
 [[nodiscard]] Answer jsonAnswer(const platform::Value& value, int status = 200);
-/// An answer with the body {"error": text}.
+/// Returns an answer with the body {"error": text}.
 [[nodiscard]] Answer errorAnswer(int status, std::string text);
 
 } // namespace devserver

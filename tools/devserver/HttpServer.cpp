@@ -23,12 +23,12 @@ namespace {
 
 constexpr int kBacklog = 128;
 constexpr unsigned kIdleSeconds = 60;
-/// Header fields of a request, and the buffers to read and write with.
+/// Bytes for the header fields of a request, and for the buffers to read and write.
 constexpr std::size_t kConnectionMemory = 64u << 10;
 constexpr std::size_t kPiece = 1u << 16;
 constexpr std::size_t kPackedFrom = 256; // smaller bodies hardly shrink
 
-/// A request while it arrives.
+/// A request that is being received.
 struct Exchange {
     Request request;
     bool begun = false;
@@ -41,7 +41,7 @@ std::string contentsOf(const std::filesystem::path& path)
     return {std::istreambuf_iterator<char>(file), {}};
 }
 
-/// The address and the port of a socket's name.
+/// Returns the address and the port of a socket address.
 std::pair<std::string, int> endOf(const sockaddr& address)
 {
     std::array<char, INET6_ADDRSTRLEN> text{};
@@ -61,7 +61,7 @@ std::string headerOf(const Headers& headers, std::string_view name)
     return value ? *value : "";
 }
 
-/// What the library asks for piece by piece: a padded, cut or endless body.
+/// A padded, cut or endless body, which the library reads piece by piece.
 struct Stream {
     Answer answer;
     std::size_t length = 0; // as announced; endless bodies have none
@@ -107,7 +107,7 @@ Response streamed(Answer answer)
             MHD_destroy_response};
 }
 
-/// The answer as the library sends it. Bodies that are sent whole are packed for clients that accept it.
+/// Converts an answer for the library. Compresses complete JSON bodies for clients that accept gzip.
 Response responseOf(Answer answer, const Request& request)
 {
     const Headers headers = answer.headers;
@@ -136,13 +136,13 @@ Response responseOf(Answer answer, const Request& request)
 struct HttpServer::Implementation {
     std::string certificate; // PEM; empty for plain HTTP
     std::string key;
-    platform::FileHandle listener; // until the daemon has it
+    platform::FileHandle listener; // until the library owns it
     Handler handler;
     MHD_Daemon* daemon = nullptr;
 
     static Implementation& of(void* self) { return *static_cast<Implementation*>(self); }
 
-    /// The raw target, before the library takes it apart.
+    /// Stores the raw target before the library parses it.
     static void* begin(void*, const char* target, MHD_Connection*)
     {
         auto exchange = std::make_unique<Exchange>();

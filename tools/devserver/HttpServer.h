@@ -11,15 +11,15 @@
 
 namespace devserver {
 
-/// One listening socket, and a thread for each of its connections, which serves HTTP/1.1.
+/// An HTTP/1.1 server with one listening socket and a thread for each connection.
 class HttpServer {
 public:
     static constexpr std::size_t kMaximumBody = 16u << 20;
 
-    /// Called for each request, on its connection's thread: it may take its time.
+    /// Called for each request, on its connection's thread; may block.
     using Handler = std::function<Answer(const Request&)>;
 
-    /// Serves plain HTTP if there is no certificate.
+    /// Without a certificate, serves plain HTTP.
     explicit HttpServer(std::optional<tavrin::tools::CertificateFiles> certificate = {});
     /// Calls `stop`.
     ~HttpServer();

@@ -14,7 +14,7 @@ namespace devserver {
 namespace {
 
 constexpr std::uint32_t kSize = 96;
-constexpr std::uint32_t kCells = 6; // across; the right half mirrors the left
+constexpr std::uint32_t kCells = 6; // per row; the right half mirrors the left
 
 std::uint64_t digest(std::string_view text) // FNV-1a, mixed once more
 {
@@ -36,7 +36,7 @@ std::string chunk(std::string_view type, std::string_view data)
     return bigEndian(static_cast<std::uint32_t>(data.size())) + checked + bigEndian(static_cast<std::uint32_t>(sum));
 }
 
-/// Incompressible bytes.
+/// Returns incompressible bytes.
 std::string noise(std::uint64_t seed, std::size_t size)
 {
     std::mt19937_64 generator(seed);

@@ -6,8 +6,8 @@
 
 namespace devserver {
 
-/// A PNG of 96 × 96 pixels that depends on the identifier alone; two identifiers rarely share one. If `size` is more
-/// bytes than the picture needs, a chunk that readers skip fills it up.
+/// Returns a PNG of 96 × 96 pixels that depends only on the identifier; two identifiers rarely share one. If it has
+/// less than `size` bytes, a chunk that readers skip pads it.
 [[nodiscard]] std::string imageFor(std::string_view identifier, std::size_t size = 0);
 
 } // namespace devserver

@@ -21,8 +21,8 @@ struct Query {
     std::vector<Word> words;
 };
 
-/// The title from folded position `from` to `to`, in lower case. If `from` splits a character ("ß" after its first
-/// "s"), the rest of that character is in its folded form.
+/// Returns the title from folded position `from` to `to`, in lower case. If `from` splits a character ("ß" after its
+/// first "s"), the rest of that character is in its folded form.
 std::string titlePart(const Entry& entry, std::size_t from, std::size_t to)
 {
     const Folded& title = entry.foldedTitle;
@@ -32,7 +32,7 @@ std::string titlePart(const Entry& entry, std::size_t from, std::size_t to)
     return part + lowerCased(original.substr(title.source[from], title.source[to] - title.source[from]));
 }
 
-/// The query begins the title's text at one of its words.
+/// Matches if the title has the query's text at the start of one of its words.
 std::optional<Match> matchRun(const Entry& entry, const Query& query)
 {
     const std::string_view title = entry.foldedTitle.text;
@@ -52,7 +52,7 @@ std::optional<Match> matchRun(const Entry& entry, const Query& query)
     return std::nullopt;
 }
 
-/// The rest of the entry's first word that starts with `prefix`.
+/// Returns the rest of the entry's first word that starts with `prefix`.
 std::optional<std::string> restOfWord(const Entry& entry, std::string_view prefix)
 {
     for (const Word& word : entry.titleWords) {

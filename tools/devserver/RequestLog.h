@@ -19,11 +19,11 @@ public:
 
     /// Logs a request on arrival, before any delay.
     void add(std::string_view endpoint, const Request& request);
-    /// The last `count` requests of an endpoint ("" for all) with a number above `since`:
-    /// {"requests": [{"number", "time", "endpoint", "method", "path", "query", "headers"}], "last": N}.
+    /// Returns the last `count` requests of an endpoint ("" for all) with a number above `since`: {"requests":
+    /// [{"number", "time", "endpoint", "method", "path", "query", "headers"}], "last": N}.
     [[nodiscard]] platform::Value list(std::string_view endpoint, std::uint64_t since, std::size_t count) const;
     [[nodiscard]] std::uint64_t total() const;
-    /// {"search": 3, ...}: the number of requests by endpoint, without those at 0.
+    /// Returns {"search": 3, …}: the number of requests by endpoint, without zeros.
     [[nodiscard]] platform::Value byEndpoint() const;
     /// Removes requests and counts. Numbers continue.
     void clear();
@@ -41,7 +41,7 @@ private:
     std::deque<Kept> _kept;
 };
 
-/// The first 100 headers as a JSON object. Values of headers with credentials are hidden.
+/// Returns the first 100 headers as a JSON object. Hides the values of headers with credentials.
 [[nodiscard]] platform::Value describeHeaders(const Headers& headers);
 
 } // namespace devserver

@@ -16,7 +16,7 @@ using platform::Value;
 
 namespace {
 
-/// Bundle identifiers with their encoding ids. The inner document is JSON text in a string of the outer one.
+/// Returns bundle identifiers with their encoding ids. The inner document is JSON text in a string of the outer one.
 std::string appAllowList(std::string_view version)
 {
     platform::Dictionary apps;
@@ -86,7 +86,7 @@ Answer resourceAnswer(std::string_view base, std::string_view path, const Reques
         answer.headers.emplace_back("Location", fmt::format("{0}/resources/hints/{1}/{2}", base, version, path));
         return answer;
     }
-    // Of the path hints/VERSION/NAME clients derive the version "VERSION-NAME-hints".
+    // Clients derive the version "VERSION-NAME-hints" from the path hints/VERSION/NAME.
     if (path.starts_with("hints/")) {
         const std::string_view rest = path.substr(6);
         const std::string_view version = rest.substr(0, rest.find('/'));

@@ -26,13 +26,13 @@ double scoreOf(const Match& match)
     return static_cast<double>(match.quality) + match.entry->popularity / 1001.0;
 }
 
-/// The service's own popularity, from 0 to 1.
+/// Returns the entry's popularity, from 0 to 1.
 double popularityScore(const Entry& entry)
 {
     return entry.popularity / 1000.0;
 }
 
-/// Suggestions, most popular first, without duplicates and without the query itself.
+/// Returns suggestions, most popular first, without duplicates and without the query itself.
 Value suggestionsFrom(std::vector<const Match*> matches, std::string_view query)
 {
     std::ranges::stable_sort(matches, std::ranges::greater(), [](const Match* m) { return m->entry->popularity; });

@@ -11,19 +11,20 @@
 
 namespace devserver {
 
-/// Answers from the catalogue: JSON arrays of result sets, before `stamp`. Immutable, hence any thread.
+/// Builds answers from the catalogue: JSON arrays of result sets, before `stamp`. Immutable: any thread.
 class SearchAnswers {
 public:
     /// `base` is the service's own HTTPS address. The catalogue must outlive this.
     SearchAnswers(const Catalogue& catalogue, std::string base) : _catalogue(catalogue), _base(std::move(base)) {}
 
-    /// One set for each of the best completions of the query; one empty set without "query" if nothing matches.
+    /// Returns one set for each of the best completions of the query, or one empty set without "query" if nothing
+    /// matches.
     [[nodiscard]] platform::Value search(std::string_view query, bool withSuggestions = true) const;
-    /// Popular results of every section, and popular queries as suggestions.
+    /// Returns popular results of every section, and popular queries as suggestions.
     [[nodiscard]] platform::Value zeroKeyword() const;
-    /// The next results of one section.
+    /// Returns the next results of one section, from `offset` on.
     [[nodiscard]] platform::Value moreResults(std::string_view query, const Section& section, std::size_t offset) const;
-    /// Results with "lookup_instructions". `domain` prefers a section by its key.
+    /// Returns results with "lookup_instructions"; those of the section with the key `domain` come first.
     [[nodiscard]] platform::Value lookup(std::string_view words, std::string_view domain) const;
     /// Returns nullopt for an unknown identifier.
     [[nodiscard]] std::optional<platform::Value> card(std::string_view identifier) const;
@@ -38,7 +39,7 @@ private:
     std::string _base;
 };
 
-/// Values that `stamp` adds to every result set of an answer.
+/// The values that `stamp` adds to every result set of an answer.
 struct Stamp {
     std::string fbq;             ///< opaque; returned in feedback
     std::string partialClientIp; ///< the client's address without its last part
@@ -47,7 +48,7 @@ struct Stamp {
 };
 void stamp(platform::Value& answer, const Stamp& stamp);
 
-/// "192.0.2.7" → "192.0.2.0"; the first three groups of an IPv6 address.
+/// Returns an address without its end: "192.0.2.0" for "192.0.2.7", the first three groups of an IPv6 address.
 [[nodiscard]] std::string partialAddress(std::string_view address);
 
 } // namespace devserver

@@ -36,7 +36,7 @@ bool holdBack(Gate& gate, const std::vector<Fault>& faults, int connection)
     return true;
 }
 
-/// The number in the query item `name`; 0 if there is none.
+/// Returns the number in the query item `name`; 0 if it is missing or invalid.
 std::size_t numberIn(const Request& request, std::string_view name)
 {
     const std::string text = request.item(name).value_or("0");
@@ -80,7 +80,7 @@ Answer Service::answer(const Request& request)
     const std::string_view endpoint = endpointOf(request);
     log.add(endpoint, request);
     const std::vector<Fault> wanted = faults.take(endpoint);
-    if (!holdBack(gate, wanted, request.connection)) return Answer{.status = 499, .cut = true}; // nobody reads it
+    if (!holdBack(gate, wanted, request.connection)) return Answer{.status = 499, .cut = true}; // no peer reads it
 
     const bool isUpload = endpoint == "upload" && request.method == "POST";
     Upload upload = isUpload ? checkUpload(request) : Upload();
@@ -92,7 +92,7 @@ Answer Service::answer(const Request& request)
                 return gate.wait(kPace, connection) == Gate::Outcome::TimeOver;
             };
     }
-    // HTTP allows these no body: a client would take its bytes for the next answer on the connection.
+    // These statuses have no body in HTTP: a client would read its bytes as the next answer on the connection.
     if (answer.status == 204 || answer.status == 304)
         answer = {.status = answer.status, .headers = std::move(answer.headers)};
     if (isUpload) {
@@ -109,8 +109,8 @@ Answer Service::answerEndpoint(std::string_view endpoint, const Request& request
                            "served here: /bag, /search, /more, /card, /flight, /images/ID, /resources/NAME, /warm, "
                            "/feedback, /crowdsourcing; and /control over HTTP");
     const bool get = request.method == "GET" || request.method == "HEAD";
-    if (endpoint == "upload") return errorAnswer(405, "feedback comes by POST");
-    if (!get) return errorAnswer(405, "only GET and HEAD here");
+    if (endpoint == "upload") return errorAnswer(405, "feedback must be sent with POST");
+    if (!get) return errorAnswer(405, "only GET and HEAD are allowed");
     if (isSearch(endpoint)) return answerSearch(endpoint, request);
     if (endpoint == "bag") {
         Answer answer = jsonAnswer(bag.document());

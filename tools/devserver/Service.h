@@ -23,9 +23,9 @@ public:
     /// `base` is the service's own HTTPS address, "https://127.0.0.1:8443".
     explicit Service(const std::string& base);
 
-    /// Answers a request. Blocks for as long as its faults demand.
+    /// Serves a request. Blocks as long as its faults demand.
     [[nodiscard]] Answer answer(const Request& request);
-    /// Ends all delays, now and later.
+    /// Ends all current and later delays.
     void stop() { gate.close(); }
 
     static constexpr std::uint64_t kDefaultMaxAge = 60;
@@ -50,7 +50,7 @@ private:
     std::atomic<std::uint64_t> _searches = 0;
 };
 
-/// The name of the request's endpoint; "unknown" if it isn't served.
+/// Returns the name of the request's endpoint; "unknown" if it isn't served.
 [[nodiscard]] std::string_view endpointOf(const Request& request);
 
 } // namespace devserver

@@ -64,7 +64,7 @@ bool isOneOf(const Value& value, const auto& texts)
     return text && std::ranges::find(texts, *text) != texts.end();
 }
 
-/// Whether the value is a non-negative integer, written as one.
+/// Returns a non-negative integer that is written as one; nullopt for any other value.
 std::optional<std::uint64_t> count(const Value& value)
 {
     return value.type() == Value::Type::Double ? std::nullopt : value.asUInt();

@@ -38,7 +38,7 @@ std::optional<std::string> shapeProblem(const Upload& upload)
     return std::nullopt;
 }
 
-/// The text without control characters, for one line.
+/// Returns the text with blanks instead of control characters.
 std::string oneLine(std::string text)
 {
     for (char& c : text)
@@ -72,7 +72,7 @@ Upload checkUpload(const Request& request)
     auto json = platform::parseJson(*text, tavrin::tools::kMaximumUpload);
     if (json) upload.json = std::move(*json);
     if (!upload.digest) return refused("no header \"X-Quorvane-Digest\"");
-    if (!upload.digestFits) return refused("the digest is another one than that of the JSON text");
+    if (!upload.digestFits) return refused("the digest is not that of the JSON text");
     if (!json) return refused("not JSON: " + json.error().reason());
     upload.problem = shapeProblem(upload);
     return upload;
@@ -96,7 +96,7 @@ std::string Uploads::add(Upload upload, const Answer& answer)
     const bool taken = answer.status == 200 && !answer.cut;
 
     const std::lock_guard lock(_mutex);
-    // A wrong digest doesn't identify the upload.
+    // A wrong digest does not identify the upload, so its repeats are not counted.
     Seen none;
     Seen& seen = upload.digestFits ? _seen(*upload.digest) : none;
     const std::uint64_t repeat = seen.received++;

@@ -25,7 +25,7 @@ struct Upload {
     platform::Value json;               ///< null if the text isn't JSON
     std::optional<std::string> problem; ///< the first problem found
 
-    /// 200, or 400 with the problem as its text.
+    /// Returns status 200, or 400 with the problem as its text.
     [[nodiscard]] Answer answer() const;
 };
 
@@ -33,7 +33,7 @@ struct Upload {
 /// hexadecimal. At /feedback the JSON must be a session (`sessionShapeProblem`), elsewhere any object.
 [[nodiscard]] Upload checkUpload(const Request& request);
 
-/// The received uploads: the last ones whole, and counts of all. Any thread.
+/// The received uploads: the contents of the last ones, and counts of all. Any thread.
 class Uploads {
 public:
     static constexpr std::size_t kKept = 100;
@@ -42,12 +42,12 @@ public:
 
     /// Stores an upload with its answer; returns a line about both, for people.
     std::string add(Upload upload, const Answer& answer);
-    /// [{"number", "path", "query", "size", "packed_size", "digest", "digest_ok", "repeat", "status", "cut", "agent",
-    /// "events", "error", "json"}], oldest first. "repeat" is the number of earlier uploads with the same digest,
-    /// whatever their answer; "status" and "cut" describe the answer, after faults.
+    /// Returns [{"number", "path", "query", "size", "packed_size", "digest", "digest_ok", "repeat", "status", "cut",
+    /// "agent", "events", "error", "json"}], oldest first. "repeat" is the number of earlier uploads with the same
+    /// digest, regardless of their answer. "status" and "cut" describe the answer after faults.
     [[nodiscard]] platform::Value list() const;
-    /// {"received", "taken", "refused", "repeats", "events"}: counts since the start. Taken uploads are those whose
-    /// answer was a whole 200; their events are counted once for each digest.
+    /// Returns {"received", "taken", "refused", "repeats", "events"}: counts since the start or `clear`. An upload is
+    /// taken if its answer was a complete 200. Its events are counted once for each digest.
     [[nodiscard]] platform::Value totals() const;
     void clear();
 

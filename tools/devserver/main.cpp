@@ -21,7 +21,7 @@ namespace {
 
 using namespace devserver;
 
-/// The host in URLs for clients on this machine.
+/// Returns the host for URLs that clients on this machine use.
 std::string hostFor(const std::string& address)
 {
     if (address == "0.0.0.0") return "127.0.0.1";
@@ -55,7 +55,7 @@ std::expected<void, std::string> run(const Options& options, const sigset_t& sig
                                                                std::chrono::system_clock::now());
     if (!certificate) return std::unexpected(certificate.error());
 
-    if (!options.readyFile.empty()) { // a file of an earlier run names wrong addresses
+    if (!options.readyFile.empty()) { // a file of an earlier run has wrong addresses
         std::error_code ignored;
         std::filesystem::remove(options.readyFile, ignored);
     }
@@ -94,7 +94,7 @@ std::expected<void, std::string> run(const Options& options, const sigset_t& sig
         if (!options.quiet) {
             fmt::print(stderr,
                        "tavrin-devserver: {} entries; the bag is at {}/bag\n"
-                       "  SSL_CERT_FILE={} makes clients trust it; docs/devserver.md tells the rest\n",
+                       "  set SSL_CERT_FILE={} so that clients trust it; see docs/devserver.md\n",
                        service.catalogue.entries().size(), base, certificate->certificate.string());
             service.onUpload = printUpload;
         }
@@ -114,13 +114,13 @@ std::expected<void, std::string> run(const Options& options, const sigset_t& sig
 int main(int argc, char** argv)
 {
     const Options options = parseOptions(argc, argv);
-    // Blocked before the first thread starts, so that only sigwait takes them.
+    // Blocked before the first thread starts, so that only sigwait receives them.
     sigset_t signals;
     sigemptyset(&signals);
     sigaddset(&signals, SIGINT);
     sigaddset(&signals, SIGTERM);
     pthread_sigmask(SIG_BLOCK, &signals, nullptr);
-    std::signal(SIGPIPE, SIG_IGN); // the reader of the first line may have gone before the next
+    std::signal(SIGPIPE, SIG_IGN); // the reader may close the pipe after the first line
     try {
         const auto result = run(options, signals);
         if (result) return 0;
