@@ -34,7 +34,7 @@ Date now()
 /// Parses seconds since 1970, or a date with an optional time, which is UTC if it ends with "Z".
 Date dateOf(const std::string& text)
 {
-    constexpr std::int64_t kLatest = 9'000'000'000; // in 2255; a date has no room for much more
+    constexpr std::int64_t kLatest = 9'000'000'000; // in 2255; a date can't hold much more
     const auto inRange = [](std::int64_t seconds) { return seconds >= 0 && seconds <= kLatest; };
     std::int64_t seconds = 0;
     const auto number = std::from_chars(text.data(), text.data() + text.size(), seconds);
@@ -54,7 +54,8 @@ Date dateOf(const std::string& text)
         }
     }
     throw Failure(
-        fmt::format("\"{}\" is no date; write 2026-01-31T12:00, 2026-01-31T12:00:00Z or seconds since 1970", text), 2);
+        fmt::format("\"{}\" is not a date; write 2026-01-31T12:00, 2026-01-31T12:00:00Z or seconds since 1970", text),
+        2);
 }
 
 std::string dateText(Date date)
@@ -100,7 +101,7 @@ void add(const Options& options, const ActivityOptions& mine)
     if (mine.app.empty())
         throw Failure("--app must not be empty: it is the application's identifier, org.example.News", 2);
     if (!mine.url.empty() && !isUrl(mine.url))
-        throw Failure(fmt::format("\"{}\" is no URL; write https://news.example/today, or news://item/42", mine.url),
+        throw Failure(fmt::format("\"{}\" is not a URL; write https://news.example/today, or news://item/42", mine.url),
                       2);
     AppActivity activity{.start = mine.at.empty() ? now() : dateOf(mine.at),
                          .bundleIdentifier = mine.app,

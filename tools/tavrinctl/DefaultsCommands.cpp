@@ -32,7 +32,7 @@ constexpr std::array kKnownKeys{
     KnownKey{"TAVSharedSession", "boolean", "all clients share one session; read at start"},
     KnownKey{"TAVSessionSizeLimit", "number", "bytes of a session file; read at start"},
     KnownKey{"TAVSessionMaxAge", "number", "seconds that a session file is kept; read at start"},
-    KnownKey{"TAVPersistSessions", "boolean", "the clients known survive a restart; read at start"},
+    KnownKey{"TAVPersistSessions", "boolean", "known clients survive a restart; read at start"},
     KnownKey{"TAVNoQueryCache", "boolean", "no answers from memory"},
     KnownKey{"TAVNoParallax", "boolean", "no TCP Fast Open, no TLS session tickets; read at start"},
     KnownKey{"TAVDebugParameters", "string", "name=value&… for every request; read at start"},
@@ -132,7 +132,7 @@ void addDefaultsCommands(CLI::App& app, Command& chosen)
     defaults->require_subcommand(1);
     const auto add = [&](const char* name, const char* description, auto action) {
         CLI::App* command = defaults->add_subcommand(name, description);
-        command->add_option("--suite", options->suite, "Program whose settings are meant")->capture_default_str();
+        command->add_option("--suite", options->suite, "Program whose settings to use")->capture_default_str();
         command->callback([&chosen, action, options] {
             chosen = [action, options](const Options& common) { action(common, *options); };
         });

@@ -25,10 +25,11 @@ namespace tavrin::ctl {
 /// The body of an upload.
 struct FlushedBody {
     std::size_t packedSize = 0;
-    std::string text;     ///< unpacked; empty where it can't be
-    platform::Value json; ///< null where it is none
-    std::string problem;  ///< why it can't be read; empty where it can
+    std::string text;     ///< decompressed; empty if that failed
+    platform::Value json; ///< null if the text is not JSON
+    std::string problem;  ///< why the body can't be read; empty if it can
 };
+/// Decompresses and parses a body.
 [[nodiscard]] FlushedBody flushedBody(const platform::Bytes& packed);
 
 /// Formats a session's agent, user, number of events and sizes, and on a second line its first event types; or the keys

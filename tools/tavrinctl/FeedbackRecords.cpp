@@ -59,9 +59,9 @@ private:
     struct Open {
         Value json;
         std::string place;
-        std::string_view key; ///< of a record: at hand
+        std::string_view key; ///< of a record: the current field
         std::vector<std::string_view> fields;
-        std::size_t index; ///< of an array: one behind the element at hand
+        std::size_t index; ///< of an array: after the current element
     };
 
     /// The JSON of the current value.
@@ -106,7 +106,7 @@ public:
     void value(const Value&) override {}
 };
 
-/// Reads one record, or adds what is wrong with it to the problems.
+/// Parses one record. The error lists its problems.
 std::expected<ReportedEvent, std::vector<std::string>> eventIn(const Value& json)
 {
     const auto wrong = [](std::string problem) { return std::unexpected(std::vector{std::move(problem)}); };

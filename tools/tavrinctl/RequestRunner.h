@@ -34,7 +34,7 @@ public:
     void waitForAll();
     /// Sends a request and blocks until its answer or the time-out.
     Exchange run(TAVRequest& request, std::string query);
-    /// The same through the endpoint, as views do that outlive their search.
+    /// The same through the endpoint, which serves views that outlive their search.
     Exchange runThroughEndpoint(TAVRequest& request, std::string query);
 
 private:

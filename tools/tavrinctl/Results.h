@@ -12,7 +12,7 @@ namespace tavrin::ctl {
 enum class Outcome {
     Answered,
     Skipped,   ///< the daemon had a reason not to ask the service
-    Overtaken, ///< a later request was accepted before the answer came, which was then delivered empty
+    Overtaken, ///< a later request was accepted before the answer came, which was delivered empty
     Failed,
 };
 [[nodiscard]] std::string_view outcomeName(Outcome outcome);

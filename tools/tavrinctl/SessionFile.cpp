@@ -45,7 +45,7 @@ std::optional<std::string> take(SessionFile& file, std::size_t offset, std::stri
         if (!value->asString()) return "the first record is not the version's text";
         file.version = *value->asString();
     } else if (file.session.isNull()) {
-        if (!isOfClass(*value, "ClientSession")) return "the second record is no session";
+        if (!isOfClass(*value, "ClientSession")) return "the second record is not a session";
         file.session = std::move(*value);
     } else {
         if (!isOfClass(*value, "TavrinFeedback")) return "no event";

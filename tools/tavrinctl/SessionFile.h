@@ -25,11 +25,12 @@ struct SessionFile {
     };
 
     std::optional<std::string> version;
-    platform::Value session; ///< a record of class "ClientSession"; null where there is none
+    platform::Value session; ///< a record of class "ClientSession"; null if it can't be read
     std::vector<Event> events;
     std::optional<Damage> damage;
 };
 
+/// Reads a session file up to its first unreadable record.
 [[nodiscard]] SessionFile readSessionFile(std::string_view bytes);
 
 } // namespace tavrin::ctl

@@ -67,7 +67,7 @@ void Terminal::leave()
 {
     if (!std::exchange(_entered, false)) return;
     show(kLeave);
-    tcsetattr(STDIN_FILENO, TCSAFLUSH, &_original); // drops unread keys, which are not meant for the shell
+    tcsetattr(STDIN_FILENO, TCSAFLUSH, &_original); // drops unread keys, so that the shell does not get them
 }
 
 Terminal::Input Terminal::read()
