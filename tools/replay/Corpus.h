@@ -11,14 +11,14 @@
 ///
 ///     WANTED <tab> PAUSE:KEY PAUSE:KEY …
 ///
-/// WANTED is what the user had in mind and is for readers only. PAUSE is the time since the previous key in
-/// milliseconds. KEY is the typed character: "␣" for a blank, "⌫" for Backspace. Every query starts with empty input.
-/// Lines that begin with "#" are comments.
+/// WANTED is the user's intention, for readers only. PAUSE is the time since the previous key in milliseconds. KEY is
+/// the typed character: "␣" for a blank, "⌫" for Backspace. Every query starts with empty input. Lines that begin with
+/// "#" are comments.
 namespace tavrin::replay {
 
 struct Keystroke {
     std::chrono::milliseconds pause{0};
-    std::string text; ///< all that stands in the line of input after this key; may be empty
+    std::string text; ///< the complete input after this key; may be empty
 };
 
 struct TypedQuery {
@@ -26,7 +26,7 @@ struct TypedQuery {
     std::vector<Keystroke> keys;
 };
 
-/// The error names the line and the problem.
+/// Parses a corpus. The error names the line and the problem.
 [[nodiscard]] platform::Result<std::vector<TypedQuery>> parseCorpus(std::string_view text);
 
 } // namespace tavrin::replay

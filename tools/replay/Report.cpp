@@ -125,7 +125,7 @@ void Report::checkCached(const Search& search, const TAVAnswer& answer, const Va
         if (!query || !platform::lowerCased(*query).starts_with(typed))
             _stale.push_back(fmt::format("\"{}\" got results for \"{}\"", search.text, query ? *query : ""));
         const double maxAge = sets[i]["max_age"].asDouble().value_or(0);
-        // It was fetched before its answer came here, so it is older than this.
+        // The set was fetched before its answer arrived here, so it is older than this difference.
         if (maxAge > 0 && fetched != _fetched.end() && search.sent - fetched->second > maxAge)
             _stale.push_back(fmt::format("\"{}\" got results of {:.1f} s ago, which last {:g} s", search.text,
                                          search.sent - fetched->second, maxAge));
@@ -154,7 +154,7 @@ Value Report::json() const
 
 std::string Report::text() const
 {
-    std::string text = fmt::format("{} keys, of which {} asked for nothing\n"
+    std::string text = fmt::format("{} keys, {} of them without a request\n"
                                    "{} answered from memory, {} requests: {:.1f} % of requests saved\n",
                                    _keys, _skipped, hits(), requests(), savedPercent());
     if (_overtaken > 0) text += fmt::format("{} of the requests were overtaken by a later key\n", _overtaken);

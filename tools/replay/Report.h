@@ -14,7 +14,7 @@ namespace tavrin::replay {
 enum class Kind {
     Cache,   ///< answered from memory
     Network, ///< answered by the service
-    Empty,   ///< neither reply nor error: too short, switched off, or overtaken
+    Empty,   ///< neither reply nor error: too short, disabled, or overtaken
     Failed,
 };
 
@@ -23,14 +23,14 @@ struct Search {
     std::int64_t queryId = 0;
     std::string text;
     bool overtaken = false; ///< a later key was sent before the answer came
-    bool tooShort = false;  ///< for the bag, or the bag has search switched off
+    bool tooShort = false;  ///< shorter than the bag's minimum, or the bag disables search
     double sent = 0;        ///< seconds on the monotonic clock
     double answered = 0;
 };
 
 [[nodiscard]] Kind kindOf(const platform::Result<TAVAnswer>& answer);
 
-/// Counts the answers to one connection's verbose searches and finds those that must not have been delivered. The
+/// Counts the answers to one connection's verbose searches and finds answers that should not have been delivered. The
 /// caller passes the times. Not thread-safe.
 class Report {
 public:
@@ -43,7 +43,7 @@ public:
     [[nodiscard]] std::uint64_t hits() const { return static_cast<std::uint64_t>(_cache.size()); }
     /// The number of searches that went to the service, including overtaken ones.
     [[nodiscard]] std::uint64_t requests() const { return _network.size() + _overtaken + _failed.size(); }
-    /// One message for each stale answer, and for each failed one.
+    /// Return one message for each stale and each failed answer.
     [[nodiscard]] const std::vector<std::string>& stale() const { return _stale; }
     [[nodiscard]] const std::vector<std::string>& failed() const { return _failed; }
 
@@ -63,7 +63,7 @@ private:
     std::vector<std::string> _stale;
     std::vector<std::string> _failed;
     std::int64_t _newestAnswered = 0;
-    std::map<std::string, double> _fetched; // when the service's latest answer for a text had come, overtaken or not
+    std::map<std::string, double> _fetched; // arrival of the service's latest answer for a text, even if overtaken
 };
 
 /// Returns the smallest value that is not exceeded by `percent` of the values; 0 if there are none.
