@@ -22,7 +22,7 @@ const std::vector<std::string_view> kTAVResourceIdentifiers{
 
 namespace {
 
-// What a key's value may be: each type reads one, or nothing for a value of another type.
+// The types of keys. Each reads a value of its type, and returns nothing for any other value.
 
 struct Text {
     static constexpr std::string_view kExpected = "a string or a number";
@@ -94,7 +94,7 @@ struct ViewsByClient {
     }
 };
 
-/// A key that `Type` reads.
+/// A key and its type.
 template <class T> struct Key {
     using Type = T;
     std::string_view name;
@@ -139,7 +139,7 @@ consteval std::size_t rowOf(std::string_view name)
     return row;
 }
 
-/// The key of this name. A name that the table lacks does not compile.
+/// The key of this name. An unknown name does not compile.
 template <Name name> constexpr const auto& kKey = std::get<rowOf(name.text)>(kKeys);
 
 void findProblems(const Value& view, const std::string& where, std::vector<std::string>& problems)

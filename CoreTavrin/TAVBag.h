@@ -22,7 +22,7 @@ namespace tavrin {
 /// Immutable, and cheap to copy: the raw bag is shared. Any thread.
 class TAVBag {
 public:
-    /// Wraps a raw bag, a dictionary; anything else reads as an empty one.
+    /// Wraps a raw bag. Any value but a dictionary counts as an empty bag.
     TAVBag(platform::Value rawBag, std::string userAgent);
 
     [[nodiscard]] const platform::Value& rawBag() const { return _rawBag; }

@@ -105,7 +105,7 @@ private:
 ///     (*bridge)->wait([&] { return seenEnough; }, timeout);
 class TAVFlusherClient : public TAVConnection {
 public:
-    /// `listener` must outlive the connection.
+    /// Connects to the bridge. `listener` must outlive the connection.
     [[nodiscard]] static platform::Result<std::unique_ptr<TAVFlusherClient>> connect(const std::string& endpoint,
                                                                                      TAVFlusherListener& listener);
 

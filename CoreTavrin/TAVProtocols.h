@@ -109,7 +109,7 @@ public:
 /// The path of every object that the daemon exports.
 inline constexpr std::string_view kObjectPath = "/com/quorvane/tavrind";
 
-/// The interfaces of the three kinds of connection.
+/// Return the interfaces of the three kinds of connection.
 [[nodiscard]] const platform::ipc::Interface& daemonInterface();
 [[nodiscard]] const platform::ipc::Interface& endpointInterface();
 [[nodiscard]] const platform::ipc::Interface& flusherInterface();

@@ -9,7 +9,7 @@
 
 namespace tavrin {
 
-/// The HTTP request behind a verbose reply.
+/// The HTTP request of a verbose reply.
 struct TAVHTTPRequest : platform::RecordOf<TAVHTTPRequest> {
     static constexpr std::string_view kClass = "TAVHTTPRequest";
     std::string url;
@@ -23,7 +23,7 @@ struct TAVHTTPRequest : platform::RecordOf<TAVHTTPRequest> {
     }
 };
 
-/// The HTTP response behind a verbose reply.
+/// The HTTP response of a verbose reply.
 struct TAVHTTPResponse : platform::RecordOf<TAVHTTPResponse> {
     static constexpr std::string_view kClass = "TAVHTTPResponse";
     std::string url; ///< the final one, after redirects

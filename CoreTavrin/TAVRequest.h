@@ -35,11 +35,11 @@ struct TAVRequest : platform::RecordOf<TAVRequest> {
     static constexpr std::string_view kClass = "TAVRequest";
 
     std::string queryString;         ///< what the user typed
-    std::int64_t queryId = 0;        ///< rises with every request of a connection
+    std::int64_t queryId = 0;        ///< increases with every request of a connection
     std::uint64_t clientQueryId = 0; ///< the client's own number for the query; 0 for none
     std::vector<std::shared_ptr<TAVQueryItem>> queryItems;
     double scale = 0;          ///< of the client's screen, for images; 0 is the main screen's
-    bool verboseReply = false; ///< the reply carries the HTTP request and response
+    bool verboseReply = false; ///< the reply includes the HTTP request and response
     StartSearchTrigger triggerEvent = StartSearchTrigger::Unknown;
     std::optional<std::string> uuid;
     std::optional<std::string> keyboardInputMode; ///< default: the current keyboard's

@@ -12,7 +12,7 @@
 /// What a search finds: results, sections and suggestions.
 namespace tavrin {
 
-/// An array of records that may be missing, which differs from an empty one.
+/// An array of records, or nothing; a missing array differs from an empty one.
 template <class T> using RecordArray = std::optional<std::vector<std::shared_ptr<T>>>;
 
 /// A displayed text.

@@ -8,7 +8,7 @@ namespace tavrin {
 
 std::expected<std::string_view, const char*> ArchivedDataIterator::_next()
 {
-    // With exactly a length left, hasMore() is true and this fails: the file was cut there.
+    // If only a length is left, hasMore() returns true and this fails: the file was truncated there.
     if (_position + kLengthSize >= _data.size()) return std::unexpected("out of range");
     std::uint64_t length = 0;
     std::memcpy(&length, _data.data() + _position, sizeof(length));

@@ -15,7 +15,7 @@ class ArchivedDataIterator {
 public:
     explicit ArchivedDataIterator(platform::Bytes data) : _data(std::move(data)) {}
 
-    /// Returns whether a length fits before the end. No record need follow it.
+    /// Returns whether another length fits before the end. Its record may be missing.
     [[nodiscard]] bool hasMore() const { return _position + kLengthSize <= _data.size(); }
     /// Returns the next record's archive, which is valid as long as the iterator. At the end or at a broken record,
     /// logs the reason, returns nothing and does not advance.
@@ -23,7 +23,7 @@ public:
     /// Moves to the first broken record or the end, without a log line, and returns the number of records passed.
     std::uint64_t countRecords();
 
-    /// The offset of the next record's length.
+    /// Returns the offset of the next record's length.
     [[nodiscard]] std::uint64_t position() const { return _position; }
     [[nodiscard]] std::uint64_t size() const { return _data.size(); }
 

@@ -46,7 +46,7 @@ platform::ActivityCriteria criteria()
     return criteria;
 }
 
-/// Sets the activity's state; a refusal is logged.
+/// Sets the activity's state, and logs a refusal.
 void setState(ActivityState state, platform::Activity& activity)
 {
     const ActivityState current = TavrinXPCActivity::getStateForActivity(activity);

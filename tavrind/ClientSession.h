@@ -81,13 +81,13 @@ private:
     ClientSessionHeader _header;
     std::shared_ptr<FileContainer> _storageHandle;
     std::shared_ptr<platform::Queue> _sessionQueue;
-    /// On the queue; shared with the writes under way. Filled only if the assembly's `testFeedbacks` is set.
+    /// On the queue; shared with pending writes. Filled only if the assembly's `testFeedbacks` is set.
     std::shared_ptr<std::vector<std::shared_ptr<TavrinFeedback>>> _sessionFeedbacks;
 };
 
-/// Returns the user default that holds the date of a client's last first use; nothing for an untracked client.
+/// Returns the user default with the date of a client's latest first session of a day; nothing for an untracked client.
 [[nodiscard]] std::optional<std::string> firstUseKey(std::string_view userAgent);
-/// Returns the client that such a key counts for in the statistics; nothing for a key of no client.
+/// Returns the client of such a key, under its name in the statistics; nothing if there is no such client.
 [[nodiscard]] std::optional<std::string_view> dailyActiveClient(std::string_view firstUseKey);
 
 } // namespace tavrin

@@ -84,7 +84,7 @@ public:
     [[nodiscard]] const std::shared_ptr<TavrinUserGUIDController>& guidController() const { return _guidController; }
     [[nodiscard]] const std::shared_ptr<platform::Queue>& sessionQueue() const { return _sessionQueue; }
 
-    /// The daemon's own user agent, "tavrind/VERSION".
+    /// Returns the daemon's own user agent, "tavrind/VERSION".
     [[nodiscard]] static const std::string& tavrindUserAgent();
     /// Wraps an error of the daemon as feedback of the current user.
     [[nodiscard]] static std::shared_ptr<TavrinFeedback> errorFeedback(const platform::Error& error,
@@ -104,7 +104,7 @@ private:
     void _onUserGuidSoftLimitReached();
     void _flushSessionWithReason(SessionEndReason reason, std::move_only_function<void()> callback);
 
-    // What transitions do.
+    // The actions of transitions.
     void _add(Occasion& occasion);
     void _begin(Occasion& occasion);
     void _nothing(Occasion& occasion);

@@ -28,7 +28,7 @@ public:
     [[nodiscard]] StreamStatus streamStatus() const override { return _status; }
     [[nodiscard]] std::optional<platform::Error> streamError() const override { return _error; }
 
-    /// The digest of the uncompressed bytes as 128 lower-case hexadecimal digits. Valid after `close`.
+    /// Returns the digest of the uncompressed bytes as 128 lower-case hexadecimal digits. Valid after `close`.
     [[nodiscard]] std::string dataDigestForStream() const;
     [[nodiscard]] const OutputStream& outputStream() const { return *_outputStream; }
 

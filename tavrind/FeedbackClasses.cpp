@@ -255,7 +255,7 @@ void addReason(JsonFields& fields, const TavrinSessionEndFeedback& record)
     fields("reason", TavrinSessionEndFeedback::triggerEventEnumToString(record.reason));
 }
 
-/// The JSON of a custom record is the whole event.
+/// The event consists only of the custom record's JSON.
 void addReadyMade(JsonFields& fields, const ZRCustomFeedback& record)
 {
     if (const platform::Dictionary* made = record.jsonFeedback.asDictionary()) fields.object() = *made;
@@ -269,7 +269,7 @@ EventType customEventType(const ZRCustomFeedback& record)
     return type < kTypes.size() ? kTypes[type] : CustomUnknown;
 }
 
-/// A row for the class `R`. `kType` is its event type, or a function that returns it.
+/// Returns the row of the class `R`. `kType` is its event type, or a function that returns it.
 template <class R, auto kType, auto kFields = noFields, auto kQuery = noQuery, auto kProcess = keepsIdentifiers>
 consteval FeedbackClass row()
 {
@@ -316,7 +316,7 @@ constexpr FeedbackClass kClasses[] = {
     row<ZRSectionRankingFeedback, Unknown, addObject, noQuery, shows<itself>>(),
     row<ZRResultRankingFeedback, Unknown, addObject, noQuery, shows<itself>>(),
 
-    // Visible results are only referred to: the whole results are in the ranking and section events.
+    // An event of visible results only refers to them: the complete results are in the ranking and section events.
     row<ZRVisibleResultsFeedback, VisibleResults, addVisibleResults, queryOf<results>, refersTo<results>>(),
     row<ZRResultsReceivedAfterTimeoutFeedback, ResultsReceivedAfterTimeout, addResults, queryOf<results>,
         shows<results>>(),

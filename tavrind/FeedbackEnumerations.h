@@ -30,7 +30,7 @@ template <class E> [[nodiscard]] const platform::Value& enumToString(E value)
     return index < strings.size() ? strings[index] : kNone;
 }
 
-/// `enumToString` under the name that a field's conversion has, for the enumerations of that field.
+/// `enumToString` under the name of a field's conversion, restricted to the enumerations of that field.
 template <class... Enumerations> struct EnumToString {
     template <class E>
         requires(std::is_same_v<E, Enumerations> || ...)

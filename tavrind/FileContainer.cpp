@@ -29,7 +29,7 @@ const platform::Log& log()
     return TavrinLogForCategory(kLogFeedbackStorage);
 }
 
-/// The classes of records in a session file.
+/// Returns the classes of records in a session file.
 const platform::RecordClasses& fileRecordClasses()
 {
     static const auto classes = [] {

@@ -17,7 +17,7 @@ public:
     [[nodiscard]] virtual std::optional<std::size_t> getFeedbacksToSend(OutputStream& stream) = 0;
     /// Returns the number of recorded events in it.
     [[nodiscard]] virtual std::size_t recordedEvents() const = 0;
-    /// For log lines.
+    /// Returns a text for log lines.
     [[nodiscard]] virtual std::string description() const = 0;
 };
 

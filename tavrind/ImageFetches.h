@@ -19,7 +19,7 @@ namespace tavrin {
 /// A wait for fetches. Every fetch that belongs to it holds a copy; it ends when the last copy is destroyed.
 using ImageGroup = std::shared_ptr<void>;
 
-/// One image to be fetched, or under way.
+/// The fetch of one image, waiting or under way.
 struct ImageFetch {
     platform::Url url;
     std::optional<platform::Duration> timeoutInterval; ///< default: the session's

@@ -42,7 +42,7 @@ public:
 
     /// Returns the best set for the request's text and scale, or null. Removes expired sets that it finds.
     [[nodiscard]] std::shared_ptr<const CachedResultSet> getRequest(const TAVRequest& request);
-    /// The same for a text at any scale.
+    /// Returns the best set for a text at any scale, or null.
     [[nodiscard]] std::shared_ptr<const CachedResultSet> get(std::string text);
     /// Stores the set under its query, in place of an earlier one. Ignores a set whose query is empty or contains a
     /// NUL. Ignores and logs a set whose input is longer than its query.

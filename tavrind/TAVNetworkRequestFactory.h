@@ -116,7 +116,7 @@ public:
 
     [[nodiscard]] platform::UrlRequest fileDownloadRequest(const platform::Url& url, const std::string& version,
                                                            bool includeLatLong);
-    /// Method POST, without the body.
+    /// Creates a POST request without a body.
     [[nodiscard]] platform::UrlRequest flusherUploadRequest(const platform::Url& url, platform::Duration timeout,
                                                             const std::string& digest);
     [[nodiscard]] platform::UrlRequest warmRequest(const platform::Url& url);

@@ -30,7 +30,7 @@ class TAVBag;
 
 /// The kind of feedback that a flusher sends. The numbers are stored with upload tasks.
 enum class FlusherIdentity : std::int64_t {
-    Crowdsourcing, ///< records that clients report for a service of their own
+    Crowdsourcing, ///< records that clients report for a separate service
     Feedbacks,     ///< sessions
 };
 template <> inline constexpr auto kTexts<FlusherIdentity> = texts("crowdsourcing", "Feedbacks");

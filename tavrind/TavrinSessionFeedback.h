@@ -36,7 +36,7 @@ struct TavrinSessionEndFeedback : platform::RecordOf<TavrinSessionEndFeedback, Z
     TavrinSessionEndFeedback() = default;
     explicit TavrinSessionEndFeedback(SessionEndReason reason_) : reason(reason_) {}
 
-    /// The texts of the reasons, by value.
+    /// Returns the texts of the reasons, by value.
     [[nodiscard]] static constexpr std::span<const std::string_view> eventTypes() { return kTexts<SessionEndReason>; }
     /// Returns the text of a reason; null for a number without one, which a damaged session file may hold.
     [[nodiscard]] static const platform::Value& triggerEventEnumToString(SessionEndReason reason)

@@ -15,8 +15,8 @@ namespace tavrin {
 ///
 /// A forced item or header replaces the one of its name; a default is only added if there is none of its name. The base
 /// URL's own query items are forced first, so that a default never replaces them. There is one item and one header for
-/// each name, compared exactly. The query is sorted by name: equal items always give the same URL, whatever the order
-/// in which they were added.
+/// each name, compared exactly. The query is sorted by name: equal items always give the same URL, regardless of the
+/// order of their addition.
 ///
 /// Short-lived. Not synchronised: one thread at a time.
 class TavrinURLRequestBuilder {
@@ -33,11 +33,11 @@ public:
     void defaultQueryItemWithName(std::string_view name, std::optional<std::string> value);
 
     [[nodiscard]] bool containsHttpHeaderWithName(std::string_view name) const { return _httpHeaders.contains(name); }
-    /// No value removes the header.
+    /// Without a value, removes the header.
     void forceHttpHeaderWithName(std::string name, std::optional<std::string> value);
     void defaultHttpHeaderWithName(std::string_view name, std::string value);
 
-    /// The request as collected so far, with default method, cache policy and time-out. May be called repeatedly.
+    /// Returns the request collected so far, with default method, cache policy and time-out. May be called repeatedly.
     [[nodiscard]] platform::UrlRequest createMutableUrlRequest() const;
     [[nodiscard]] const platform::UrlRequest createUrlRequest() const { return createMutableUrlRequest(); }
 

@@ -176,8 +176,9 @@ int critbit_delete(critbit_tree& tree, std::string_view key)
 
 void critbit_clear(critbit_tree& tree)
 {
-    // Each turn frees the first leaf and its node, or rotates a node down to the right until the first leaf hangs from
-    // the root. A node is rotated once, so this takes no stack and no more steps than there are nodes.
+    // Each iteration frees the first leaf and its node, or rotates a node down to the right until the first leaf is a
+    // child of the root. A node is rotated at most once, so the loop is linear in the number of nodes and needs no
+    // stack.
     while (isInternal(tree.root)) {
         Internal& node = internal(tree.root);
         const Link first = node.child[0];

@@ -9,10 +9,10 @@ namespace tavrin {
 /// An ordered map from byte strings to opaque values: a crit-bit tree, which branches only at bits in which keys
 /// differ. It finds all keys with a given prefix, in order, without looking at any other.
 ///
-/// Keys may hold any byte but NUL, compare as unsigned bytes and are copied. Every key takes one allocation of its
-/// length plus 9 bytes, and every key but the first another one of 24 bytes. No operation recurses, or allocates in
-/// proportion to what it visits, except that the walk's stack grows with the depth of the tree (at most 8 levels for
-/// each byte of a key).
+/// Keys may hold any byte except NUL; they compare as unsigned bytes and are copied. Every key takes one allocation of
+/// its length plus 9 bytes; every key except the first takes another one of 24 bytes. No operation recurses, or
+/// allocates in proportion to what it visits, except that the walk's stack grows with the depth of the tree (at most 8
+/// levels for each byte of a key).
 ///
 /// A zeroed tree is empty. The owner must clear the tree before destroying it. Not thread-safe.
 struct critbit_tree {

@@ -28,7 +28,7 @@ public:
     /// Overrides the bag's keys with those of an object; null removes a key; an integer "version" sets the number that
     /// `bump` raises. The error says why: not an object, or more than 256 KiB of overrides.
     std::expected<void, std::string> merge(const platform::Value& keys);
-    /// Removes all overrides. The version stays: it only grows.
+    /// Removes all overrides. Keeps the version, which only grows.
     void reset();
 
 private:

@@ -37,7 +37,7 @@ public:
     Catalogue();
 
     [[nodiscard]] const std::vector<Entry>& entries() const { return _entries; }
-    /// Returns null if there is none.
+    /// Returns the entry with this identifier, or null.
     [[nodiscard]] const Entry* find(std::string_view identifier) const;
 
 private:
@@ -45,7 +45,7 @@ private:
 };
 
 [[nodiscard]] const std::vector<Section>& sections();
-/// Returns null if there is none.
+/// Returns the section with this key, or null.
 [[nodiscard]] const Section* findSection(std::string_view key);
 
 } // namespace devserver

@@ -34,7 +34,7 @@ struct Fault {
         RetryAfter
     };
     Kind kind = Kind::Delay;
-    std::uint64_t number = 0; ///< milliseconds, status code, bytes, depth or seconds; 0 if the kind takes none
+    std::uint64_t number = 0; ///< milliseconds, status code, bytes, depth or seconds; 0 if the kind has none
 
     friend bool operator==(const Fault&, const Fault&) = default;
 };

@@ -26,7 +26,7 @@ struct Request {
     std::string body;
     std::string peer;    ///< the client's address
     bool secure = false; ///< received over TLS
-    int connection = -1; ///< the connection's socket, to notice that the peer left; -1 if unknown
+    int connection = -1; ///< the connection's socket, to detect that the peer disconnects; -1 if unknown
 
     /// Returns the decoded value of the first query item of that name; nullopt if there is none. "+" decodes to a
     /// blank, as in forms.

@@ -22,7 +22,7 @@ constexpr std::size_t kMaximumQueryBytes = 2000;
 constexpr std::size_t kMaximumImage = 16u << 20;
 constexpr std::chrono::milliseconds kPace{50}; // between the blanks of an endless body
 
-/// Applies the faults that delay a request. Returns false if the peer left meanwhile.
+/// Applies the faults that delay a request. Returns false if the peer disconnects.
 bool holdBack(Gate& gate, const std::vector<Fault>& faults, int connection)
 {
     for (const Fault& fault : faults) {

@@ -103,7 +103,7 @@ void Report::addUnanswered(const Search& search)
     _failed.push_back(fmt::format("\"{}\" ({}): no answer", search.text, search.queryId));
 }
 
-/// Answers arrive in the order in which the daemon sent them: none with results may follow the answer to a later
+/// Answers arrive in the order in which the daemon sent them. An answer with results must not follow that of a later
 /// search.
 void Report::checkOrder(const Search& search)
 {

@@ -41,7 +41,7 @@ public:
 
     [[nodiscard]] std::uint64_t keys() const { return _keys; }
     [[nodiscard]] std::uint64_t hits() const { return static_cast<std::uint64_t>(_cache.size()); }
-    /// The number of searches that went to the service, including overtaken ones.
+    /// Returns the number of searches that were sent to the service, including overtaken ones.
     [[nodiscard]] std::uint64_t requests() const { return _network.size() + _overtaken + _failed.size(); }
     /// Return one message for each stale and each failed answer.
     [[nodiscard]] const std::vector<std::string>& stale() const { return _stale; }

@@ -55,7 +55,7 @@ double now()
     return static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_nsec) * 1e-9;
 }
 
-/// A client that sends a search for each key and receives the answers meanwhile.
+/// A client that sends a search for each key, and receives answers between the keys.
 class Replay {
 public:
     explicit Replay(const Options& options)

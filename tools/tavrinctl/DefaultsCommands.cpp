@@ -59,7 +59,7 @@ Dictionary readSettings(const std::filesystem::path& path)
     return *value->asDictionary();
 }
 
-/// Sets one key under the file's lock and keeps what other processes wrote meanwhile. Null removes the key.
+/// Sets one key under the file's lock, and keeps the changes of other processes. Null removes the key.
 Dictionary change(const std::filesystem::path& path, const std::string& key, const Value& value)
 {
     platform::Log::threshold = platform::LogLevel::Fault; // failures are reported below
@@ -78,7 +78,7 @@ bool fits(const Value& value, std::string_view type)
     return value.asString() != nullptr;
 }
 
-/// Parses the typed value as JSON, or takes it as a string if it is not JSON or if the key is known to be a string.
+/// Parses the typed value as JSON. Uses it as a string if it is not JSON, or if the key is known to be a string.
 Value settingValue(const std::string& key, const std::string& typed)
 {
     const auto known = std::ranges::find(kKnownKeys, key, &KnownKey::key);

@@ -64,14 +64,14 @@ private:
         std::size_t index; ///< of an array: after the current element
     };
 
-    /// The JSON of the current value.
+    /// Returns the JSON of the current value, and moves to the next array element.
     Value next()
     {
         if (_open.empty()) return _json;
         Open& open = _open.back();
         return open.json.asArray() ? open.json[open.index++] : open.json[open.key];
     }
-    /// The path of the current value; valid after `next`.
+    /// Returns the path of the current value; valid after `next`.
     [[nodiscard]] std::string place() const
     {
         if (_open.empty()) return {};

@@ -14,7 +14,7 @@
 namespace tavrin::ctl {
 
 struct ReportedEvent {
-    std::int64_t queryId = 0; ///< the daemon's query that the event belongs to; 0 is none
+    std::int64_t queryId = 0; ///< the daemon's query that the event belongs to; 0 for none
     std::shared_ptr<ZRFeedback> feedback;
 };
 

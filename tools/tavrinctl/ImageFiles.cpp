@@ -49,7 +49,7 @@ std::string imageFileName(std::string_view urlOrIdentifier, std::string_view typ
     std::string name;
     for (const char c : text) {
         const char kept = isPlain(c) ? c : '_';
-        if (kept == '_' && name.ends_with('_')) continue; // one for a run of them, and for a letter of many bytes
+        if (kept == '_' && name.ends_with('_')) continue; // one for a run of them or a multi-byte character
         if (kept == '.' && name.empty()) continue;
         name += kept;
         if (name.size() == kLongestName) break;

@@ -26,7 +26,7 @@ public:
     Action feed(char byte);
 
     [[nodiscard]] const std::string& text() const { return _text; }
-    /// The cursor as a byte offset into `text()`.
+    /// Returns the cursor as a byte offset into `text()`.
     [[nodiscard]] std::size_t cursor() const { return _cursor; }
 
 private:

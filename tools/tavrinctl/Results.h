@@ -12,7 +12,7 @@ namespace tavrin::ctl {
 enum class Outcome {
     Answered,
     Skipped,   ///< the daemon had a reason not to ask the service
-    Overtaken, ///< a later request was accepted before the answer came, which was delivered empty
+    Overtaken, ///< delivered empty, because a later request was accepted before the answer came
     Failed,
 };
 [[nodiscard]] std::string_view outcomeName(Outcome outcome);
@@ -24,7 +24,7 @@ struct Exchange {
     double latency = 0;              ///< milliseconds from the call to its answer
     bool overtaken = false;          ///< a later request was sent before the answer came
     std::string skipReason;          ///< why the daemon would skip this query, by its bag; empty if it wouldn't
-    std::optional<TAVAnswer> answer; ///< none: no answer in time, or the connection ended
+    std::optional<TAVAnswer> answer; ///< nothing: no answer in time, or the connection ended
     std::string problem;             ///< what happened instead of an answer
 
     bool showHttp = false; ///< the HTTP request and response are to be shown

@@ -52,7 +52,7 @@ Part aroundCursor(std::string_view text, std::size_t cursor, int columns)
     int skipped = 0;
     std::size_t begin = 0;
     for (const Character& character : charactersOf(text)) {
-        if (wanted - skipped < columns) break; // the cursor has a column of its own
+        if (wanted - skipped < columns) break; // leaves a column for the cursor
         skipped += character.columns;
         begin += character.bytes.size();
     }

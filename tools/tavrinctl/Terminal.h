@@ -7,8 +7,9 @@
 
 namespace tavrin::ctl {
 
-/// Puts the terminal into raw mode on its alternate screen. The destructor and `suspend` restore it; SIGINT, SIGTERM
-/// and SIGHUP arrive as input, so that only SIGKILL leaves the terminal changed. At most one instance; not thread-safe.
+/// Puts the terminal into raw mode on its alternate screen. The destructor and `suspend` restore it. SIGINT, SIGTERM,
+/// SIGHUP and SIGQUIT arrive as input, so that they don't leave the terminal changed. At most one instance; not
+/// thread-safe.
 class Terminal {
 public:
     /// Throws `Failure` if standard input or output is not a terminal.
@@ -30,8 +31,8 @@ public:
 
     [[nodiscard]] ScreenSize size() const;
     void show(const std::string& bytes);
-    /// Restores the terminal and stops the process, as Ctrl-Z does; returns after SIGCONT. If a signal asked the
-    /// program to end meanwhile, the terminal stays restored.
+    /// Restores the terminal and stops the process, as Ctrl-Z does; returns after SIGCONT. If a signal has asked the
+    /// program to end by then, the terminal stays restored.
     void suspend();
 
 private:
