@@ -85,6 +85,7 @@ public:
     [[nodiscard]] ClientView view() const;
     [[nodiscard]] std::optional<std::string> userAgent() const { return view().userAgent; }
     [[nodiscard]] std::shared_ptr<const TAVBag> bag() const { return view().bag; }
+    /// Restores a saved user agent. Unlike `bag`, does not rebuild the bag.
     void setUserAgent(std::string userAgent);
     void setConfiguration(std::shared_ptr<const TAVSessionConfiguration> configuration);
     /// Returns the session manager that receives the client's feedback; null only during start-up.

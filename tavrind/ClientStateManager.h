@@ -50,6 +50,7 @@ public:
     void loadImages(platform::Value::Array images, std::uint64_t timeout,
                     platform::Reply<platform::Value> reply) override;
 
+    /// Performs the request for the configuration's client. Without a valid identifier, replies with error 500.
     void request(std::shared_ptr<TAVRequest> request, std::shared_ptr<TAVSessionConfiguration> configuration,
                  RequestReply reply) override;
 

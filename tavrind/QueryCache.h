@@ -54,7 +54,9 @@ public:
                  std::uint64_t generation);
     /// Returns a number that changes whenever the answers to requests built before must no longer be stored.
     [[nodiscard]] std::uint64_t generation() const { return _generation; }
+    /// Empties the cache asynchronously, and changes the generation at once.
     void removeAllObjects();
+    /// Returns the number of sets, including expired ones. Blocks like a look-up.
     [[nodiscard]] std::size_t count() const;
 
 private:

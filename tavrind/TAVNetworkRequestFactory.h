@@ -92,6 +92,7 @@ public:
     explicit TAVNetworkRequestFactory(Assembly& assembly);
     ~TAVNetworkRequestFactory() override;
 
+    /// Creates the request for the bag of the device's country; it ignores the HTTP cache. `version` may be empty.
     [[nodiscard]] platform::UrlRequest bagFetchRequest(const TavrinBagController& controller,
                                                        const std::string& userAgent, const std::string& version);
     /// This request is never sent. Its URL identifies the bag's context: if it has changed since the fetch, the bag is
@@ -114,11 +115,14 @@ public:
     /// For a flight search or flight lookup.
     [[nodiscard]] Request flightRequest(const ClientRequest& client);
 
+    /// Creates the request for a resource file. `version` is sent as "If-None-Match" unless it is empty.
+    /// `includeLatLong` adds the location of the last search, if it is known.
     [[nodiscard]] platform::UrlRequest fileDownloadRequest(const platform::Url& url, const std::string& version,
                                                            bool includeLatLong);
     /// Creates a POST request without a body.
     [[nodiscard]] platform::UrlRequest flusherUploadRequest(const platform::Url& url, platform::Duration timeout,
                                                             const std::string& digest);
+    /// Creates a request that only opens a connection; it has no shared items and ignores the HTTP cache.
     [[nodiscard]] platform::UrlRequest warmRequest(const platform::Url& url);
 
     /// Stores the current location for later file downloads. Call it after each network search.

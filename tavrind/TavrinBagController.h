@@ -84,6 +84,7 @@ public:
     [[nodiscard]] std::shared_ptr<const TAVBag> cachedBagState();
     /// Returns the bag, or null. Starts no fetch.
     [[nodiscard]] std::shared_ptr<const TAVBag> inMemoryBag() const;
+    /// Returns the bag's warm-up URL, if any. Starts fetches like `currentBag`.
     [[nodiscard]] std::optional<platform::Url> warmURL();
 
     /// Fetches the version that the service announces, a number under "bag", if the bag in memory is older and

@@ -23,6 +23,7 @@ public:
     /// Registers the task, in place of one with the same name. A run of a removed or replaced task continues to its
     /// end.
     void registerTask(std::shared_ptr<const TavrinDPPeriodicTask> task);
+    /// Removes the task of this name, if any.
     void unregisterTask(const TavrinDPPeriodicTask& task);
     /// Returns the tasks by name.
     [[nodiscard]] Tasks allTasks() const;

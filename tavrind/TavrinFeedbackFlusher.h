@@ -94,6 +94,7 @@ public:
     [[nodiscard]] std::int64_t getFeedbackCountForTask(const platform::BackgroundTask& task);
     [[nodiscard]] std::map<std::uint64_t, std::int64_t> feedbacksPerTask();
 
+    /// Sets the endpoint, asynchronously. The endpoint of sessions gets the query "v=2" in place of its own.
     void setEndpoint(std::optional<platform::Url> endpoint);
     void bagChangeNotification(const std::shared_ptr<const TAVBag>& bag);
 
