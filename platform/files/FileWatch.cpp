@@ -2,6 +2,7 @@
 
 #include <cstring>
 #include <sys/inotify.h>
+#include <utility>
 
 #include <systemd/sd-event.h>
 
