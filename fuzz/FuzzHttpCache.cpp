@@ -75,10 +75,10 @@ void use(const fs::path& directory)
         const auto found = (*store)->find(key);
         if (found && *found)
             check((*found)->body == answerFor(key, size).body && (*found)->response.headers.size() == 2, key);
-        if (!found && Sqlite::isDamage(found.error())) check((*store)->beginAnew().has_value());
+        if (!found && Sqlite::isDamage(found.error())) check((*store)->reset().has_value());
         auto kept = (*store)->put(key, answerFor(key, size));
         if (!kept) {
-            const auto begun = (*store)->beginAnew();
+            const auto begun = (*store)->reset();
             check(begun.has_value(), kept.error().description());
             kept = (*store)->put(key, answerFor(key, size));
             check(kept.has_value(), kept ? "" : kept.error().description());

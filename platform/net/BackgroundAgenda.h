@@ -12,12 +12,11 @@
 
 namespace platform {
 
-/// Decides which background tasks may begin, which have run out of time, and when to look again. Pure: no I/O and no
-/// clock of its own.
+/// Decides which background tasks may start, which have expired, and when to ask again. Does no I/O and has no clock.
 ///
-/// A task in the agenda waits (for a moment, or for its host's hold to end), is ready, or is under way. Ready tasks
-/// begin in the order of their identifiers. All times are counts of one `LivedTime`; `now` must not go back. One thread
-/// at a time.
+/// A task in the agenda waits (until a time, or for the end of its host's hold), is ready, or is in progress. Ready
+/// tasks start in the order of their identifiers. All times are counts of one `LivedTime`; `now` must not decrease. One
+/// thread at a time.
 class BackgroundAgenda {
 public:
     using TaskId = std::uint64_t;
@@ -25,26 +24,26 @@ public:
     struct Plan {
         std::string host;     ///< the task waits while this host is on hold
         Duration notBefore{}; ///< start of the next attempt
-        Duration deadline{};  ///< end of the task, under way or not
+        Duration deadline{};  ///< when the task expires, in progress or not
         bool underWay = false;
     };
 
-    /// At most `maximumUnderWay` tasks are under way at once.
+    /// At most `maximumUnderWay` tasks are in progress at once.
     explicit BackgroundAgenda(unsigned maximumUnderWay) : _maximumUnderWay(maximumUnderWay) {}
 
     /// Adds the task, or replaces its plan.
     void put(TaskId task, Plan plan, Duration now);
     /// Does nothing if the task isn't in the agenda.
     void remove(TaskId task);
-    /// Lets no task to that host begin before `until`. Replaces an earlier hold.
+    /// Keeps tasks to that host from starting before `until`. Replaces an earlier hold.
     void hold(const std::string& host, Duration until) { _holds[host] = until; }
 
-    /// Removes the tasks whose deadline has come and returns them, the earliest deadline first.
+    /// Removes the tasks whose deadline has passed and returns them, the earliest deadline first.
     [[nodiscard]] std::vector<TaskId> takeExpired(Duration now);
-    /// Returns the task to begin next, or nothing if none is ready or the limit is reached. The caller reports the
-    /// begin by `put`.
+    /// Returns the task to start next, or nothing if none is ready or the limit is reached. The caller reports the
+    /// start with `put`.
     [[nodiscard]] std::optional<TaskId> next(Duration now);
-    /// When `takeExpired` and `next` must be asked again; nothing while the agenda is empty.
+    /// Returns when to call `takeExpired` and `next` again; nothing if the agenda is empty.
     [[nodiscard]] std::optional<Duration> nextDue() const;
 
 private:
@@ -57,7 +56,7 @@ private:
     const unsigned _maximumUnderWay;
     unsigned _underWay = 0;
     std::map<TaskId, Entry> _entries;
-    std::set<std::pair<Duration, TaskId>> _dues; // each task once: the end of its wait, or else its deadline
+    std::set<std::pair<Duration, TaskId>> _dues; // one for each task: the end of its wait, else its deadline
     std::set<TaskId> _ready;
     std::map<std::string, Duration> _holds;
 };

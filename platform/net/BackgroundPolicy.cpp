@@ -23,7 +23,7 @@ Duration retryDelay(unsigned failures, double jitter)
     return durationFromSeconds(longest * (0.5 + std::clamp(jitter, 0.0, 1.0) / 2));
 }
 
-bool mayGetBetter(const Error& error)
+bool isTransient(const Error& error)
 {
     if (error.domain == kPosixErrorDomain) return error.code == ENOSPC || error.code == EDQUOT;
     if (error.domain != kUrlErrorDomain) return false;
@@ -46,7 +46,7 @@ std::optional<Duration> retryAfter(std::string_view field, Date now)
     if (field.size() > kLongestDate) return std::nullopt;
     const time_t date = curl_getdate(std::string(field).c_str(), nullptr);
     if (date < 0) return std::nullopt;
-    // As seconds: a date far off doesn't fit nanoseconds.
+    // Computed in seconds: a date in the far future doesn't fit nanoseconds.
     const double wait = static_cast<double>(date) - secondsSince1970(now);
     return std::clamp<Duration>(durationFromSeconds(wait), 0s, kLongest);
 }

@@ -8,17 +8,17 @@
 
 namespace platform {
 
-// What background transfers decide: pure functions.
+// The decisions of background transfers. Pure functions; any thread.
 
-/// How long to wait after an attempt failed, for the `failures`th time (from 1): grows from about half a minute to an
-/// hour. `jitter`, from 0 to 1, spreads the devices that lost the same service at the same moment.
+/// Returns the delay after the `failures`th failed attempt (from 1): it doubles from 30 s to one hour, times a factor
+/// between 0.5 and 1 selected by `jitter` (0 to 1), which spreads devices that lost the service at the same time.
 [[nodiscard]] Duration retryDelay(unsigned failures, double jitter);
 
-/// Whether another attempt may end better than with this error.
-[[nodiscard]] bool mayGetBetter(const Error& error);
+/// Returns true if another attempt may succeed after this error.
+[[nodiscard]] bool isTransient(const Error& error);
 
-/// The wait that a Retry-After field asks for (RFC 9110, 10.2.3): seconds, or a date; a day at most. Nothing for a
-/// field that says neither.
+/// Parses a Retry-After field (RFC 9110, 10.2.3), seconds or a date, and returns the delay, at most one day. Returns
+/// nothing for an invalid field.
 [[nodiscard]] std::optional<Duration> retryAfter(std::string_view field, Date now);
 
 } // namespace platform

@@ -44,7 +44,7 @@ std::size_t sizeOf(const UrlRequest& request)
     return size;
 }
 
-/// The folder of a session: its identifier, made a file name.
+/// Returns the directory name of a session: its identifier, escaped for a file name.
 std::string folderName(const std::string& identifier)
 {
     std::string name = percentEncodePathSegment(identifier);
@@ -54,7 +54,7 @@ std::string folderName(const std::string& identifier)
 
 class Session;
 
-/// A task, as its owner sees it; the session keeps the rest.
+/// The owner's view of a task; the session has the rest.
 class Task final : public BackgroundTask, public std::enable_shared_from_this<Task> {
 public:
     Task(std::weak_ptr<Session> session, const StoredTask& stored)
@@ -95,7 +95,7 @@ private:
     Value _timing; // under the mutex
 };
 
-/// Tells the delegate of an upload's progress. Reports that come faster than it listens are merged into the latest.
+/// Reports an upload's progress to the delegate. Merges reports that arrive faster than the delegate's queue runs.
 class Progress : public std::enable_shared_from_this<Progress> {
 public:
     Progress(std::weak_ptr<BackgroundSessionDelegate> delegate, std::shared_ptr<Queue> queue,
@@ -171,7 +171,7 @@ public:
         });
     }
 
-    // Of a task.
+    // Called by tasks.
     void resume(const std::shared_ptr<Task>& task)
     {
         _queue->sync([&] { _resume(task); });
@@ -189,7 +189,7 @@ public:
             _save(*entry);
         });
     }
-    /// Its owner has let go of it.
+    /// Removes a task that was never resumed. Called by its destructor.
     void released(std::uint64_t identifier)
     {
         onQueue([identifier](Session& self) {
@@ -201,12 +201,12 @@ private:
     struct Entry {
         StoredTask stored;
         std::weak_ptr<Task> handle;
-        std::shared_ptr<Task> kept; ///< from resume on
+        std::shared_ptr<Task> kept; ///< null before resume
         std::shared_ptr<UrlTask> attempt;
         std::uint64_t attemptNumber = 0;
     };
 
-    /// Runs `work` on the queue, if the session is still there then.
+    /// Runs `work` on the queue, unless the session has been destroyed by then.
     template <class Work> void onQueue(Work work)
     {
         _queue->async([weak = weak_from_this(), work = std::move(work)]() mutable {
@@ -263,13 +263,13 @@ private:
     const std::shared_ptr<UrlSession> _loads;
 
     std::unique_ptr<BackgroundStore> _store;
-    std::optional<Error> _storeError; // why there is none
-    Duration _storeRetry{};           // until then no new task tries to open it again
+    std::optional<Error> _storeError; // why the store is missing
+    Duration _storeRetry{};           // earliest time of the next attempt to open it
     LivedTime _time;
     std::map<std::uint64_t, Entry> _entries;
-    std::vector<std::uint64_t> _leftOver; ///< ended tasks that could not be removed from the store yet
+    std::vector<std::uint64_t> _leftOver; ///< ended tasks that are still in the store
     std::uint64_t _bodyBytes = 0;
-    BackgroundAgenda _agenda; // of the resumed tasks that have not ended
+    BackgroundAgenda _agenda; // resumed tasks that have not ended
     std::uint64_t _lastAttempt = 0;
     Clock::TimerId _timer = 0;
     std::optional<Duration> _timerDue;
@@ -297,7 +297,7 @@ void Task::cancel()
 void Task::setNote(Value note)
 {
     if (const std::size_t size = jsonSize(note); size > kMaximumNote)
-        return defaultLog().error("a note of {} bytes is left out of background task {}", size, _identifier);
+        return defaultLog().error("a note of {} bytes is too large for background task {}", size, _identifier);
     {
         std::lock_guard lock(_mutex);
         _note = note;
@@ -315,7 +315,7 @@ void Session::_openStore(bool make)
     auto store = BackgroundStore::open(_environment.files, directory);
     if (!store) {
         const Error error = store.error();
-        defaultLog().error("background transfers can't be kept in {}: {}", directory.string(), error.description());
+        defaultLog().error("background transfers can't be stored in {}: {}", directory.string(), error.description());
         store = BackgroundStore::openTemporary(_environment.files, _environment.temporary);
         if (!store) {
             _storeError = store.error();
@@ -332,7 +332,7 @@ void Session::_takeUp(BackgroundStore::Contents contents)
 {
     _time = LivedTime(_environment.clock, contents.time);
     const Duration now = _time.now();
-    // A time beyond what this class writes would hold the host for ever.
+    // Clamped: a manipulated time would hold the host for ever.
     for (const auto& [host, until] : contents.holds) _agenda.hold(host, std::min(until, now + kLongestHold));
     for (StoredTask& stored : contents.tasks) {
         if (!stored.resumed && !stored.outcome) {
@@ -341,7 +341,7 @@ void Session::_takeUp(BackgroundStore::Contents contents)
         }
         stored.deadline = std::min(stored.deadline, now + kLongestResourceTimeout);
         stored.notBefore = std::min(stored.notBefore, now + kLongestHold);
-        // The owner may have taken the file, and been killed before the task was forgotten: download it again.
+        // The delegate moved the file, and the process was killed before the task was removed: download it again.
         if (!stored.isUpload && stored.outcome && !stored.outcome->error && !_store->hasDownload(stored.identifier))
             stored.outcome.reset();
 
@@ -445,7 +445,7 @@ void Session::_networkChanged()
             _stopAttempt(entry);
             _schedule(entry);
         } else if (wasOffline && _network->online && !entry.attempt && entry.stored.notBefore > Duration::zero()) {
-            entry.stored.notBefore = Duration::zero(); // what failed, failed for the lack of a network
+            entry.stored.notBefore = Duration::zero(); // the failure came from the missing network
             _schedule(entry);
         }
     }
@@ -459,11 +459,11 @@ void Session::_hold(const UrlRequest& request, const UrlResponse& response)
     const auto wait = retryAfter(*field, _environment.clock.wallNow());
     if (!wait || *wait <= Duration::zero()) return;
     const Duration until = _time.now() + *wait;
-    // After a redirect, both hosts lead to the service that asked for the wait.
+    // After a redirect both hosts belong to the service that sent Retry-After.
     for (const std::string& host : std::set<std::string>{request.url.host(), response.url.host()}) {
         _agenda.hold(host, until);
         if (auto saved = _store->saveHold(host, until, _time.mark()); !saved)
-            defaultLog().error("the wait that {} asks for can't be saved: {}", host, saved.error().description());
+            defaultLog().error("the Retry-After of {} can't be saved: {}", host, saved.error().description());
     }
 }
 
@@ -485,7 +485,7 @@ void Session::_pump()
 {
     const Duration now = _time.now();
     for (const std::uint64_t task : _agenda.takeExpired(now))
-        _finish(_entries.at(task), std::nullopt, refusal(kUrlTimedOut, "not done within the time that it may take"));
+        _finish(_entries.at(task), std::nullopt, refusal(kUrlTimedOut, "not complete within the resource time-out"));
     while (_mayTransfer()) {
         const auto task = _agenda.next(now);
         if (!task) break;
@@ -516,7 +516,7 @@ void Session::_begin(Entry& entry)
     const StoredTask& stored = entry.stored;
     auto file = stored.isUpload ? _store->openBody(stored) : _store->createDownload(stored.identifier);
     if (!file) {
-        if (mayGetBetter(file.error())) return _retry(entry, file.error());
+        if (isTransient(file.error())) return _retry(entry, file.error());
         return _finish(entry, std::nullopt, std::move(file.error()));
     }
     TransferFiles files;
@@ -542,7 +542,7 @@ void Session::_ended(std::uint64_t identifier, std::uint64_t attempt, std::optio
                      std::optional<Error> error)
 {
     Entry* entry = _find(identifier);
-    if (!entry || !entry->attempt || entry->attemptNumber != attempt) return; // stopped meanwhile
+    if (!entry || !entry->attempt || entry->attemptNumber != attempt) return; // the attempt was stopped
     entry->kept->setTiming(entry->attempt->timingData());
     entry->attempt.reset();
     if (!error && response) {
@@ -550,7 +550,7 @@ void Session::_ended(std::uint64_t identifier, std::uint64_t attempt, std::optio
         if (!entry->stored.isUpload)
             if (auto synced = _store->syncDownload(identifier); !synced) error = std::move(synced.error());
     }
-    if (error && mayGetBetter(*error))
+    if (error && isTransient(*error))
         _retry(*entry, *error);
     else
         _finish(*entry, std::move(response), std::move(error));
@@ -562,7 +562,7 @@ void Session::_retry(Entry& entry, const Error& error)
     ++entry.stored.failures;
     const double jitter = std::uniform_real_distribution<double>()(_random);
     const Duration delay = retryDelay(entry.stored.failures, jitter);
-    defaultLog().info("background task {} is tried again in {:.0f} s: {}", entry.stored.identifier, toSeconds(delay),
+    defaultLog().info("background task {} will be retried in {:.0f} s: {}", entry.stored.identifier, toSeconds(delay),
                       error.description());
     entry.stored.notBefore = _time.now() + delay;
     _save(entry);

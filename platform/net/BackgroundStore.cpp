@@ -22,7 +22,7 @@ namespace {
 constexpr const char* kDatabase = "transfers.db";
 constexpr std::string_view kBodySuffix = ".body";
 constexpr std::string_view kDownloadSuffix = ".download";
-/// Of a copy that a kill left half made.
+/// Suffix of a copy that a kill interrupted.
 constexpr std::string_view kUnfinishedSuffix = ".tmp";
 constexpr std::string_view kTemporaryPrefix = "background-transfers-";
 /// A store with other tables is replaced by an empty one. Times are nanoseconds of lived time.
@@ -103,7 +103,7 @@ StoredTask::Outcome outcomeOf(const Value& value)
     return outcome;
 }
 
-/// Returns nothing for a row that isn't a task, for example because someone edited it.
+/// Returns nothing for a row that isn't a valid task, for example because it was edited.
 std::optional<StoredTask> taskOf(const Sqlite::Row& row)
 {
     StoredTask task{.identifier = static_cast<std::uint64_t>(row.integer(0)),
@@ -138,7 +138,7 @@ Sqlite::Parameter parameter(const std::optional<std::string>& text)
 
 // ---- files ----
 
-/// The identifier in the name of a task's file.
+/// Returns the identifier in the name of a task's file, or nothing for other files.
 std::optional<std::uint64_t> identifierOf(std::string_view name)
 {
     const bool ours = name.ends_with(kBodySuffix) || name.ends_with(kDownloadSuffix);
@@ -267,12 +267,12 @@ Result<void> BackgroundStore::add(StoredTask& task, const FileHandle* body, std:
         added.identifier = static_cast<std::uint64_t>(_database->lastInsertedRow());
         if (!body) return {};
 
-        // The body is whole on disk before a task says that it has one.
+        // The body is complete on disk before the task refers to it.
         const fs::path path = bodyPath(added.identifier);
         if (auto copied = _files.copy(path, *body, maximumBody); !copied) {
             if (copied.error().code != EFBIG) return copied;
             return std::unexpected(Error::withReason(std::string(kUrlErrorDomain), kUrlTooLarge,
-                                                     "the bodies of the waiting uploads are too large together"));
+                                                     "the bodies of all pending uploads are too large"));
         }
         const auto info = _files.info(path);
         if (!info) return std::unexpected(info.error());

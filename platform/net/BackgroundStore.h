@@ -16,9 +16,9 @@
 
 namespace platform {
 
-/// A background task, as it is kept on disk. Times are counts of the store's `LivedTime`.
+/// A background task as stored on disk. Times are counts of the store's `LivedTime`.
 struct StoredTask {
-    /// How it ended. Kept until its owner has been told.
+    /// The task's result. Stored until the delegate has been called.
     struct Outcome {
         std::optional<UrlResponse> response;
         std::optional<Error> error;
@@ -27,58 +27,58 @@ struct StoredTask {
     std::uint64_t identifier = 0;
     bool isUpload = false;
     std::shared_ptr<const UrlRequest> request;
-    std::uint64_t bodySize = 0; ///< bytes of an upload
+    std::uint64_t bodySize = 0; ///< bytes of an upload's body
     Value note;
     bool resumed = false;
     Duration deadline{}; ///< of a resumed task
     unsigned failures = 0;
-    Duration notBefore{}; ///< when the next attempt may begin
+    Duration notBefore{}; ///< earliest start of the next attempt
     std::optional<Outcome> outcome;
 };
 
 /// The tasks of one background session on disk: a directory (0700) with a database of the tasks and one file (0600) for
-/// each body. What a call reports done outlives a kill and a power cut. One thread at a time.
+/// each body. A change survives a kill and a power cut after its call has succeeded. One thread at a time.
 ///
-/// A lock gives the directory to one process. A database that is damaged or has other tables is logged and replaced by
-/// an empty one. Files that belong to no task, which a kill left, are removed when the store is opened.
+/// One process at a time: the store holds a lock on the directory. A database that is damaged or has other tables is
+/// logged and replaced by an empty one. Opening removes files without a task, which a kill left.
 class BackgroundStore {
 public:
     struct Contents {
         std::vector<StoredTask> tasks;         ///< in order of their identifiers
-        std::map<std::string, Duration> holds; ///< hosts that asked to be left alone, and until when
+        std::map<std::string, Duration> holds; ///< hosts that sent Retry-After, and when their hold ends
         std::optional<LivedTime::Mark> time;
     };
 
-    /// Whether there is a store in that directory.
+    /// Returns true if the directory has a store.
     [[nodiscard]] static bool exists(FileSystem& files, const std::filesystem::path& directory);
-    /// Opens or makes it; `files` must outlive it. Fails with EWOULDBLOCK while another process has it open.
+    /// Opens or creates a store; `files` must outlive it. Fails with EWOULDBLOCK if another process has it open.
     [[nodiscard]] static Result<std::unique_ptr<BackgroundStore>> open(FileSystem& files,
                                                                        const std::filesystem::path& directory);
-    /// Makes one in a directory of its own under `parent`, which is removed with the store. Removes those that killed
-    /// processes left there.
+    /// Creates a store in a new subdirectory of `parent`; the destructor removes it. Removes the temporary stores of
+    /// killed processes.
     [[nodiscard]] static Result<std::unique_ptr<BackgroundStore>> openTemporary(FileSystem& files,
                                                                                 const std::filesystem::path& parent);
     ~BackgroundStore();
 
-    /// What was in the store when it was opened. Once.
+    /// Returns the contents of the store at its opening. Call it once.
     [[nodiscard]] Contents takeContents() { return std::exchange(_contents, {}); }
     /// Adds the task with a copy of `body` (null for none), and sets its identifier and size. Fails with kUrlTooLarge
-    /// if the body has more than `maximumBody` bytes. Nothing is left of a task that couldn't be added.
+    /// if the body has more than `maximumBody` bytes. A failure leaves nothing on disk.
     [[nodiscard]] Result<void> add(StoredTask& task, const FileHandle* body, std::uint64_t maximumBody);
-    /// Keeps what has changed of it; the request and the body can't.
+    /// Updates the task, except for its request and body, which never change.
     [[nodiscard]] Result<void> save(const StoredTask& task, const LivedTime::Mark& time);
     [[nodiscard]] Result<void> saveHold(const std::string& host, Duration until, const LivedTime::Mark& time);
     /// Removes the task and its files.
     [[nodiscard]] Result<void> forget(std::uint64_t identifier);
 
-    /// Fails with EIO if the file no longer has the size that was copied.
+    /// Opens an upload's body. Fails with EIO if the file's size is not `StoredTask::bodySize`.
     [[nodiscard]] Result<FileHandle> openBody(const StoredTask& task) const;
-    /// Where a download's body goes.
+    /// Returns the path of a download's body.
     [[nodiscard]] std::filesystem::path downloadPath(std::uint64_t identifier) const;
     [[nodiscard]] bool hasDownload(std::uint64_t identifier) const;
-    /// A new, empty file there, in place of what an earlier attempt left.
+    /// Creates an empty file at that path; replaces the file of an earlier attempt.
     [[nodiscard]] Result<FileHandle> createDownload(std::uint64_t identifier) const;
-    /// Returns once the downloaded file outlives a power cut.
+    /// Makes the downloaded file durable.
     [[nodiscard]] Result<void> syncDownload(std::uint64_t identifier) const;
 
 private:
@@ -94,7 +94,7 @@ private:
 
     FileSystem& _files;
     const std::filesystem::path _directory;
-    const FileHandle _lock; // the directory is this process's while it lives
+    const FileHandle _lock; // reserves the directory for this process
     std::optional<Sqlite> _database;
     Contents _contents;
     bool _temporary = false;

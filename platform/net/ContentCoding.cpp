@@ -8,7 +8,7 @@ namespace platform {
 
 namespace {
 
-/// Nobody applies more; each costs 40 KiB.
+/// Further codings are ignored: each stage takes 40 KiB of memory.
 constexpr std::size_t kMaximumStages = 4;
 
 bool isCoding(std::string_view text, std::string_view name)
@@ -53,12 +53,12 @@ bool ContentDecoder::finished() const
     return std::ranges::all_of(_stages, &Stage::finished);
 }
 
-/// Decides by the first two bytes what follows, and prepares zlib for it.
+/// Detects the format from the first two bytes, and initializes zlib for it.
 bool ContentDecoder::Stage::begin()
 {
     const bool gzipMember = _start == "\x1f\x8b";
     if (_anyEnded && !gzipMember) {
-        _state = State::Behind;
+        _state = State::After;
         return true;
     }
     const bool zlibHeader =
@@ -71,14 +71,14 @@ bool ContentDecoder::Stage::begin()
 bool ContentDecoder::Stage::feed(std::string_view bytes, const Sink& sink)
 {
     std::array<char, 16 * 1024> decoded;
-    while (!bytes.empty() && _state != State::Behind) {
+    while (!bytes.empty() && _state != State::After) {
         std::string_view input = bytes;
         if (_state == State::Before) {
             _start.push_back(bytes.front());
             bytes.remove_prefix(1);
             if (_start.size() < 2) continue;
             if (!begin()) return false;
-            if (_state == State::Behind) break;
+            if (_state == State::After) break;
             input = _start;
         }
         _stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(input.data()));
@@ -96,7 +96,7 @@ bool ContentDecoder::Stage::feed(std::string_view bytes, const Sink& sink)
         _start.clear();
         if (result == Z_STREAM_END) {
             _anyEnded = true;
-            _state = _gzip ? State::Before : State::Behind;
+            _state = _gzip ? State::Before : State::After;
         }
     }
     return true;

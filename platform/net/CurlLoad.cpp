@@ -15,9 +15,9 @@ namespace platform {
 
 namespace {
 
-/// Of one load, over all its hops. libcurl refuses a single line beyond 100 KiB.
+/// Bytes of header fields of one load, over all hops. libcurl refuses a single line beyond 100 KiB.
 constexpr std::size_t kMaximumHeaderSize = 256u << 10;
-/// Of all bodies in memory that are not yet whole.
+/// Bytes of all incomplete bodies in memory.
 constexpr std::size_t kMaximumInMemory = 64u << 20;
 
 } // namespace
@@ -105,9 +105,9 @@ void CurlLoad::setOptions()
     set(CURLOPT_ERRORBUFFER, _errorText.data());
     set(CURLOPT_NOSIGNAL, 1L);
     set(CURLOPT_PROTOCOLS_STR, "http,https");
-    // Over HTTP/2 libcurl 7.88 loses a status that comes before the body is sent, if the stream is reset behind it.
+    // Over HTTP/2, libcurl 7.88 loses a status that arrives before the body is sent if the stream is reset after it.
     set(CURLOPT_HTTP_VERSION, static_cast<long>(hasUpload() ? CURL_HTTP_VERSION_1_1 : CURL_HTTP_VERSION_2TLS));
-    // Over plain HTTP it would hold every request back until the first one is answered.
+    // Over plain HTTP libcurl would delay every request until the first response.
     set(CURLOPT_PIPEWAIT, _configuration.pipelining && _files && _hop.url.scheme() == "https" ? 1L : 0L);
     set(CURLOPT_FRESH_CONNECT, _fresh ? 1L : 0L);
     set(CURLOPT_TCP_FASTOPEN, _configuration.allowFastOpenAndTickets ? 1L : 0L);
@@ -145,13 +145,13 @@ void CurlLoad::setHeaders(bool hasBody)
         if (curl_slist* extended = curl_slist_append(_headerList, line.c_str())) _headerList = extended;
     };
     for (const auto& [name, value] : _hop.headers) {
-        // "Name;" is how libcurl is told to send an empty field.
+        // libcurl sends an empty field for "Name;".
         const std::string line = value.empty() ? name + ";" : name + ": " + value;
         if (line.find_first_of("\r\n") == std::string::npos) add(line);
     }
     if (!_hop.headers.find("Accept-Encoding")) add(fmt::format("Accept-Encoding: {}", ContentDecoder::kAccepted));
     if (hasBody) {
-        // Neither waiting for "100 Continue", nor a form.
+        // Suppresses libcurl's "Expect: 100-continue" and its default Content-Type of a form.
         add("Expect:");
         if (!_hop.headers.find("Content-Type")) add("Content-Type:");
     }
@@ -162,7 +162,7 @@ bool CurlLoad::setUpload()
 {
     struct stat status{};
     if (fstat(_files->upload.fd(), &status) != 0) {
-        _error = Error::posix(errno, "a transfer's file");
+        _error = Error::posix(errno, "the upload's file");
         return false;
     }
     _uploadSize = static_cast<std::uint64_t>(status.st_size);
@@ -172,7 +172,7 @@ bool CurlLoad::setUpload()
         _easy, CURLOPT_READFUNCTION, +[](char* buffer, std::size_t size, std::size_t count, void* self) {
             return static_cast<CurlLoad*>(self)->readUpload(buffer, size * count);
         });
-    // From its start, for a connection that turned out to be closed.
+    // libcurl rewinds if a reused connection turns out to be closed.
     curl_easy_setopt(_easy, CURLOPT_SEEKDATA, this);
     curl_easy_setopt(
         _easy, CURLOPT_SEEKFUNCTION, +[](void* self, curl_off_t offset, int origin) {
@@ -189,9 +189,9 @@ std::size_t CurlLoad::readUpload(char* buffer, std::size_t size)
     ssize_t count = -1;
     do count = pread(_files->upload.fd(), buffer, size, static_cast<off_t>(_uploaded));
     while (count < 0 && errno == EINTR);
-    // A file that became shorter must not be sent as if it were whole.
+    // A file that was truncated meanwhile must not be sent as complete.
     if (count < 0 || (count == 0 && size > 0 && _uploaded < _uploadSize)) {
-        _error = Error::posix(count < 0 ? errno : EIO, "a transfer's file");
+        _error = Error::posix(count < 0 ? errno : EIO, "the upload's file");
         return CURL_READFUNC_ABORT;
     }
     _uploaded += static_cast<std::uint64_t>(count);
@@ -199,7 +199,7 @@ std::size_t CurlLoad::readUpload(char* buffer, std::size_t size)
     return static_cast<std::size_t>(count);
 }
 
-/// A public host must not lead us to an address of the inner network, by a redirect or by naming a URL.
+/// Aborts if a public host led to an address that isn't public, by a redirect or a URL in a response.
 int CurlLoad::mayConnect(const char* address)
 {
     _sent = true;
@@ -221,7 +221,7 @@ std::size_t CurlLoad::receivedHeader(std::string_view line)
         return 0;
     }
     if (line.starts_with("HTTP/")) {
-        _headers = {}; // of an interim answer
+        _headers = {}; // drops those of an interim response
         _headersEnded = false;
         return line.size();
     }
@@ -249,7 +249,7 @@ std::size_t CurlLoad::received(std::string_view bytes)
         return bytes.size();
     if (!_error && _wireSize > maximumSize())
         _error = urlError(kUrlTooLarge, fmt::format("more than {} bytes", maximumSize()));
-    if (!_error) _error = urlError(kUrlBadResponse, "the body isn't what its content coding says");
+    if (!_error) _error = urlError(kUrlBadResponse, "the body doesn't fit its content coding");
     return 0;
 }
 
@@ -286,7 +286,7 @@ bool CurlLoad::store(std::string_view bytes)
         const ssize_t count = pwrite(_files->download.fd(), bytes.data() + written, bytes.size() - written,
                                      static_cast<off_t>(_bodySize + written));
         if (count < 0 && errno != EINTR) {
-            _error = Error::posix(errno, "a transfer's file");
+            _error = Error::posix(errno, "the download's file");
             return false;
         }
         if (count > 0) written += static_cast<std::size_t>(count);
@@ -294,14 +294,14 @@ bool CurlLoad::store(std::string_view bytes)
     return true;
 }
 
-/// The body of an earlier hop isn't the answer's.
+/// Drops the body of an earlier hop. Returns false if the file can't be truncated.
 bool CurlLoad::forgetBody()
 {
     _inMemory -= _body.size();
     _body.clear();
     _wireSize = 0;
     if (std::exchange(_bodySize, 0) == 0 || !_files || !_files->download) return true;
-    if (ftruncate(_files->download.fd(), 0) != 0) _error = Error::posix(errno, "a transfer's file");
+    if (ftruncate(_files->download.fd(), 0) != 0) _error = Error::posix(errno, "the download's file");
     return !_error;
 }
 
@@ -316,8 +316,9 @@ UrlResponse CurlLoad::response() const
             .publicPeer = _publicPeer || (_hop.source && _hop.source->isPublic)};
 }
 
-/// True if the request went out on a connection that was open before, and nothing came back: the server had closed it,
-/// or did so at that moment. libcurl tries other old connections, which may be as dead, and gives up after five.
+/// Returns true if the request was sent on a reused connection and no byte came back: the server had closed it, or
+/// closed it at that moment. (libcurl itself retries on other reused connections, which may be dead too, and gives up
+/// after five.)
 bool CurlLoad::wasLostUnanswered(CURLcode code) const
 {
     if (_fresh || _anyHeader || _error) return false;
@@ -356,12 +357,12 @@ bool CurlLoad::goesOn(CURLcode code)
 
 std::optional<Error> CurlLoad::errorOf(CURLcode code) const
 {
-    // What an upload is answered is its status, whatever becomes of the connection, or of the rest of the body, then.
+    // A final status completes an upload, even if the connection or the rest of the body fails after it.
     if (hasUpload() && !_files->download && isFinal() && (!_error || _error->code == kUrlTimedOut)) return std::nullopt;
     if (_error) return _error;
-    // libcurl has one code for two faults.
+    // libcurl uses this code also for a response that isn't HTTP.
     if (code == CURLE_UNSUPPORTED_PROTOCOL && _sent)
-        return urlError(kUrlBadResponse, fmt::format("the answer isn't HTTP: {}", _errorText.data()));
+        return urlError(kUrlBadResponse, fmt::format("the response isn't HTTP: {}", _errorText.data()));
     if (code != CURLE_OK) return urlErrorFromCurl(code, _errorText.data());
     if (!_decoder.finished()) return urlError(kUrlBadResponse, "the body ends before its content coding does");
     return std::nullopt;

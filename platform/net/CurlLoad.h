@@ -14,28 +14,29 @@
 
 namespace platform {
 
-/// One load as libcurl sees it: a transfer for each hop, one after the other.
+/// One load: a sequence of libcurl transfers, one for each hop.
 ///
 ///     prepare ──► [transfer ──► goesOn]… ──► finish
 ///
-/// A hop that ends in a redirect, or that was lost on an old connection, is followed by another. Loader's thread only.
+/// Another hop follows a redirect, and a request that was lost on a reused connection. Loader's thread only.
 class CurlLoad {
 public:
     using TimePoint = std::chrono::steady_clock::time_point;
 
-    /// `request`, `configuration` and `files` (null for none) outlive the load. `inMemory` counts the bytes of bodies
-    /// that unfinished loads hold in memory.
+    /// `request`, `configuration` and `files` (null for a data task) must outlive the load. `inMemory` counts the bytes
+    /// of bodies that unfinished loads have in memory.
     CurlLoad(const UrlRequest& request, const UrlSessionConfiguration& configuration, const TransferFiles* files,
              std::size_t& inMemory);
     ~CurlLoad();
     CurlLoad(const CurlLoad&) = delete;
     CurlLoad& operator=(const CurlLoad&) = delete;
 
-    /// Sets the next hop up on a handle that has no options yet. False if it can't be sent; `finish` says why.
+    /// Sets up the next hop on a new or reset handle. Returns false if it can't be sent; `finish` has the error.
     [[nodiscard]] bool prepare(CURL* easy);
-    /// Whether another hop is due now that libcurl has ended one with `code`: then reset the handle and `prepare` it.
+    /// Call this after a transfer has ended with `code`. Returns true if another hop follows: reset the handle and call
+    /// `prepare`.
     [[nodiscard]] bool goesOn(CURLcode code);
-    /// Gives the load up for having taken too long.
+    /// Sets the time-out error. Call this at `deadline`.
     void timeOut(TimePoint now);
 
     struct Outcome {
@@ -44,11 +45,11 @@ public:
         std::optional<Error> error;
         Value timing;
     };
-    /// What the load came to. Once; before the handle of the last hop is reset.
+    /// Returns the result of the load. Call it once, before the handle of the last hop is reset.
     [[nodiscard]] Outcome finish(CURLcode code);
 
     [[nodiscard]] CURL* easy() const { return _easy; }
-    /// When it times out unless something is received, or sent of a file, before.
+    /// Returns when the load times out. Each received byte, and each sent byte of a file, moves the deadline.
     [[nodiscard]] TimePoint deadline() const;
 
 private:
@@ -83,22 +84,22 @@ private:
     std::size_t _headerSize = 0;
     unsigned _redirects = 0;
     LoadMarks _marks;
-    std::optional<Error> _error; // found by ourselves, in place of libcurl's
+    std::optional<Error> _error; // overrides libcurl's
 
     // The hop.
     CURL* _easy = nullptr;
     UrlRequest _hop;
-    bool _uploads = true; // a redirect may turn it into a GET
-    bool _fresh = false;  // on a new connection, because an old one was dead
+    bool _uploads = true; // false after a redirect to a GET
+    bool _fresh = false;  // requires a new connection, because a reused one was dead
     curl_slist* _headerList = nullptr;
     bool _sent = false;
     bool _anyHeader = false;
-    bool _headersEnded = false; // what comes behind the body is no header field
+    bool _headersEnded = false; // later header lines are trailers
     bool _publicPeer = false;
     HttpHeaders _headers;
     ContentDecoder _decoder;
     std::string _body;
-    std::size_t _bodySize = 0; // decoded, whether it is in memory or not
+    std::size_t _bodySize = 0; // decoded bytes, in memory or in the file
     std::size_t _wireSize = 0;
     std::uint64_t _uploaded = 0;
     std::uint64_t _uploadSize = 0;

@@ -93,7 +93,7 @@ double seconds(CURL* easy, CURLINFO info)
     return static_cast<double>(microseconds) / 1e6;
 }
 
-/// The name of the network interface with this address; empty if none has it.
+/// Returns the name of the network interface with this address; empty if there is none.
 std::string readInterfaceOf(const std::string& localIp)
 {
     ifaddrs* list = nullptr;
@@ -114,7 +114,7 @@ std::string readInterfaceOf(const std::string& localIp)
     return {};
 }
 
-/// The same, cached for 10 s: listing a device's interfaces takes longer than parsing an answer.
+/// Likewise, cached for 10 s: listing the interfaces takes longer than parsing a response.
 std::string interfaceOf(const std::string& localIp)
 {
     constexpr double kTrustedFor = 10;

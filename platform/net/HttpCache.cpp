@@ -19,22 +19,23 @@ namespace {
 
 using Stored = std::shared_ptr<const StoredResponse>;
 
-/// Of a directory that can't be used.
+/// Delay before a directory that could not be opened is tried again.
 constexpr Duration kRetryDelay = std::chrono::minutes(1);
-/// An answer takes at most this part of a capacity, so that it can't evict all others.
+/// A response takes at most a capacity divided by this, so that it can't evict all others.
 constexpr std::size_t kLargestPart = 10;
-/// Bytes that may wait to be written. Past it nothing more is kept on disk, so that a slow disk can't fill the memory.
+/// Limit of the bytes that wait to be written. Beyond it responses are not stored on disk, so that a slow disk can't
+/// exhaust memory.
 constexpr std::size_t kMostWaiting = 64u << 20;
 
 std::size_t sizeOf(const std::string& key, const StoredResponse& stored)
 {
-    constexpr std::size_t kEntrySize = 512; // what the structures take, about
+    constexpr std::size_t kEntrySize = 512; // estimate of the structures
     std::size_t size = kEntrySize + 2 * key.size() + stored.selecting.size() + stored.body.size();
     for (const auto& [name, value] : stored.response.headers) size += name.size() + value.size() + 2 * sizeof(name);
     return size;
 }
 
-/// The answers in memory, most recently used first. Under the cache's mutex.
+/// The responses in memory, most recently used first. Guarded by the cache's mutex.
 class MemoryCache {
 public:
     explicit MemoryCache(std::size_t capacity) : _capacity(capacity) {}
@@ -47,7 +48,7 @@ public:
         found->second->used = true;
         return found->second->stored;
     }
-    /// Replaces an earlier answer. One that is too large isn't kept, and the earlier one is removed all the same.
+    /// Stores a response unless it is too large; removes the earlier one in either case.
     void put(const std::string& key, Stored stored)
     {
         remove(key);
@@ -62,7 +63,7 @@ public:
     {
         if (const auto found = _byKey.find(key); found != _byKey.end()) drop(found->second);
     }
-    /// The keys of those that were found since the last time and are still here, the latest last.
+    /// Returns the keys of the entries that were found since the last call, the most recent last.
     [[nodiscard]] std::vector<std::string> takeUsed()
     {
         std::vector<std::string> keys;
@@ -93,8 +94,8 @@ private:
 
 } // namespace
 
-/// The order of the disk's changes is that of the calls, for each is queued under the mutex. Memory is ahead of the
-/// disk by those that wait; what they are about isn't taken from the disk into memory, since it may be outdated.
+/// Changes of the disk run in the order of the calls: each is queued under the mutex. Memory is newer than the disk
+/// while changes are pending, so an entry with a pending change is not copied from disk to memory.
 struct HttpCache::Impl : std::enable_shared_from_this<Impl> {
     explicit Impl(HttpCacheConfiguration configuration_)
         : configuration(std::move(configuration_)), memory(configuration.memoryCapacity)
@@ -124,7 +125,7 @@ struct HttpCache::Impl : std::enable_shared_from_this<Impl> {
         if (!hasDisk()) return;
         const std::size_t size = sizeOf(key, *shared);
         if (shared->body.size() > configuration.diskCapacity / kLargestPart || waitingBytes + size > kMostWaiting)
-            return removeBehind(std::move(key));
+            return removeLater(std::move(key));
         change(hash(key), size, [self = shared_from_this(), key, shared] { self->writeToDisk(key, *shared); });
     }
 
@@ -132,7 +133,7 @@ struct HttpCache::Impl : std::enable_shared_from_this<Impl> {
     {
         std::lock_guard lock(mutex);
         memory.remove(key);
-        if (hasDisk()) removeBehind(std::move(key));
+        if (hasDisk()) removeLater(std::move(key));
     }
 
     const HttpCacheConfiguration configuration;
@@ -141,14 +142,14 @@ private:
     [[nodiscard]] bool hasDisk() const { return configuration.files && !configuration.directory.empty(); }
     [[nodiscard]] static std::size_t hash(const std::string& key) { return std::hash<std::string>()(key); }
 
-    // Under the mutex.
+    // The caller holds the mutex.
 
-    /// Or will be, by a change that waits.
+    /// Returns true if the key may be on disk, now or after pending changes.
     [[nodiscard]] bool mayBeOnDisk(const std::string& key) const
     {
         return !onDisk || onDisk->contains(hash(key)) || changing.contains(hash(key));
     }
-    /// Queues a change of what is on disk under a key of that hash, which holds so many bytes until it is done.
+    /// Queues a change of the disk. `keyHash` is the hash of its key; the change holds `bytes` until it is done.
     void change(std::size_t keyHash, std::size_t bytes, Queue::Task work)
     {
         changing.insert(keyHash);
@@ -160,7 +161,7 @@ private:
             self->waitingBytes -= bytes;
         });
     }
-    void removeBehind(std::string key)
+    void removeLater(std::string key)
     {
         if (!mayBeOnDisk(key)) return;
         const std::size_t keyHash = hash(key);
@@ -173,7 +174,7 @@ private:
 
     // Any thread.
 
-    /// Whether nobody needs to ask the disk; `stored` is then the answer.
+    /// Returns true if the disk need not be read; `stored` is then the result.
     [[nodiscard]] bool decidedWithoutDisk(const std::string& key, Stored& stored)
     {
         std::lock_guard lock(mutex);
@@ -202,7 +203,7 @@ private:
     void writeToDisk(const std::string& key, const StoredResponse& stored)
     {
         if (store && !store->isInPlace()) {
-            defaultLog().error("the HTTP cache {} was taken away", configuration.directory.string());
+            defaultLog().error("the HTTP cache {} was removed by another process", configuration.directory.string());
             closeStore();
         }
         if (openStore()) {
@@ -259,7 +260,7 @@ private:
         auto keys = opened ? (*opened)->keys() : std::unexpected(opened.error());
         if (opened && !keys && Sqlite::isDamage(keys.error())) {
             logFailure(keys.error());
-            if ((*opened)->beginAnew()) keys = (*opened)->keys();
+            if ((*opened)->reset()) keys = (*opened)->keys();
         }
         if (!keys) {
             logFailure(keys.error());
@@ -287,14 +288,14 @@ private:
     {
         logFailure(error);
         if (!Sqlite::isDamage(error)) return;
-        if (auto begun = store->beginAnew(); !begun) {
+        if (auto begun = store->reset(); !begun) {
             logFailure(begun.error());
             closeStore();
             closed = true;
         }
     }
 
-    /// Once for a row of failures.
+    /// Logs once until a write succeeds again.
     void logFailure(const Error& error)
     {
         if (!std::exchange(failing, true))
@@ -304,14 +305,14 @@ private:
 
     std::mutex mutex;
     MemoryCache memory;                                    // under the mutex
-    std::optional<std::unordered_set<std::size_t>> onDisk; // under the mutex: hashes of the keys, or more; none before
-                                                           // it was first opened
-    std::unordered_multiset<std::size_t> changing; // under the mutex: of the changes that wait, and the one that runs
-    std::size_t waitingBytes = 0;                  // under the mutex: what those hold
-    std::unique_ptr<HttpCacheStore> store;         // queue
-    bool closed = false;                           // queue: it couldn't be opened
-    std::uint64_t nextAttempt = 0;                 // queue: host ticks
-    bool failing = false;                          // queue
+    std::optional<std::unordered_set<std::size_t>> onDisk; // under the mutex: hashes of the keys, possibly more; empty
+                                                           // until the directory was opened
+    std::unordered_multiset<std::size_t> changing;         // under the mutex: key hashes of pending and running changes
+    std::size_t waitingBytes = 0;                          // under the mutex: bytes that those hold
+    std::unique_ptr<HttpCacheStore> store;                 // queue
+    bool closed = false;                                   // queue: it could not be opened
+    std::uint64_t nextAttempt = 0;                         // queue: host ticks
+    bool failing = false;                                  // queue
 };
 
 HttpCache::HttpCache(std::shared_ptr<Impl> impl) : _impl(std::move(impl)) {}

@@ -9,38 +9,38 @@
 
 namespace platform {
 
-/// The answers that a URL session keeps: in memory, and on disk if it has a directory. The session's data tasks obey
-/// the answers' own rules of freshness (HttpCachePolicy.h); `find` and `store` ignore them.
+/// The cached responses of a URL session: in memory, and on disk if it has a directory. The session's data tasks follow
+/// the freshness rules of HTTP (HttpCachePolicy.h); `find` and `store` ignore them.
 ///
-/// One answer is kept for each URL without its fragment; the least recently used ones are evicted. Disk work is done on
-/// the configuration's queue, in the order of the calls; the directory is opened there when it is first needed. If it
-/// can't be used, a line is logged, and it is tried again a minute later at the earliest. Any thread.
+/// The cache has one response for each URL without its fragment; the least recently used ones are evicted. Disk work
+/// runs on the configuration's queue, in the order of the calls, which also opens the directory when it is first
+/// needed. If that fails, logs an error and retries after a minute or later. Any thread.
 class HttpCache {
 public:
-    /// Without a directory in the configuration it keeps what fits into memory.
+    /// Creates a cache; in memory only if the configuration has no directory.
     [[nodiscard]] static std::shared_ptr<HttpCache> make(HttpCacheConfiguration configuration);
     ~HttpCache();
     HttpCache(const HttpCache&) = delete;
     HttpCache& operator=(const HttpCache&) = delete;
 
-    /// Returns what is kept for the URL, fresh or not. Blocks while the file is read from disk. Must not be called from
-    /// a task of the cache's queue.
+    /// Returns the cached response of the URL, fresh or not; nothing if there is none. Blocks while it is read from
+    /// disk. Must not be called on the cache's queue.
     [[nodiscard]] std::optional<CachedResponse> find(const Url& url);
-    /// Keeps the answer for the URL in place of an earlier one, whatever its header fields say. `find` and `lookUp` see
-    /// it once this returns. An answer that takes more than a tenth of a capacity isn't kept there.
+    /// Stores a response, whatever its header fields say; replaces an earlier one. `find` and `lookUp` see it after
+    /// this returns. A response larger than a tenth of the memory or disk capacity is not stored there.
     void store(const Url& url, UrlResponse response, Bytes body);
-    /// Forgets what is kept for the URL.
+    /// Removes the cached response of the URL.
     void remove(const Url& url);
 
     // For the session's tasks.
 
-    /// Null: nothing is kept.
+    /// Receives null if nothing is cached.
     using Found = std::move_only_function<void(std::shared_ptr<const StoredResponse>)>;
-    /// Calls `found` with what is kept: before this returns if the answer is in memory, else on the cache's queue,
-    /// which `found` must not hold up.
+    /// Calls `found` with the cached response: before this returns if that is in memory, otherwise on the cache's
+    /// queue, which `found` must not block.
     void lookUp(const Url& url, Found found);
     void store(const Url& url, StoredResponse stored);
-    /// The clock's.
+    /// Returns the time of the configuration's clock; 1970 without one.
     [[nodiscard]] Date now() const;
 
 private:

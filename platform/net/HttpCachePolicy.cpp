@@ -27,7 +27,7 @@ std::string_view withoutBlanks(std::string_view text)
     return text.substr(first, text.find_last_not_of(" \t") - first + 1);
 }
 
-/// Calls `each` with the elements of a list. Commas inside quotation marks don't separate.
+/// Calls `each` with the elements of a comma-separated list. Ignores commas inside quotation marks.
 template <class Each> void forEachElement(std::string_view list, Each each)
 {
     bool quoted = false;
@@ -56,7 +56,7 @@ std::optional<seconds> deltaSeconds(std::string_view text)
 struct Directives {
     bool noStore = false;
     bool noCache = false;
-    std::optional<seconds> maxAge; // the smallest of several; 0 for one that isn't a number
+    std::optional<seconds> maxAge; // the smallest, if there are several; 0 for an invalid one
 };
 
 Directives directivesOf(const HttpHeaders& headers)
@@ -66,7 +66,7 @@ Directives directivesOf(const HttpHeaders& headers)
         const auto equals = element.find('=');
         const std::string_view name = withoutBlanks(element.substr(0, equals));
         if (equalIgnoringCase(name, "no-store")) found.noStore = true;
-        // With field names it concerns only those fields; confirming the whole answer is allowed, too.
+        // A "no-cache" with field names concerns only those fields; revalidating the whole response is allowed, too.
         if (equalIgnoringCase(name, "no-cache")) found.noCache = true;
         if (!equalIgnoringCase(name, "max-age")) return;
         const std::string_view value = equals == std::string_view::npos ? "" : element.substr(equals + 1);
@@ -86,7 +86,7 @@ Directives requestDirectives(const HttpHeaders& headers)
     return found;
 }
 
-/// The date in the field of that name, in seconds since 1970.
+/// Returns the date in a field, in seconds since 1970; nothing if it is missing or invalid.
 std::optional<seconds> dateIn(const HttpHeaders& headers, std::string_view name)
 {
     const std::string* field = headers.find(name);
@@ -112,7 +112,7 @@ bool hasValidator(const HttpHeaders& headers)
     return (tag && !tag->empty()) || dateIn(headers, "Last-Modified");
 }
 
-/// RFC 9110, 8.8.3.2.
+/// Compares two ETags weakly (RFC 9110, 8.8.3.2).
 bool equalWeakly(std::string_view a, std::string_view b)
 {
     if (a.starts_with("W/")) a.remove_prefix(2);
@@ -120,7 +120,7 @@ bool equalWeakly(std::string_view a, std::string_view b)
     return a == b;
 }
 
-/// Fields that a confirmation doesn't update: those of the connection, and those that describe the stored body
+/// Returns true for fields that a 304 doesn't update: those of the connection, and those that describe the stored body
 /// (RFC 9111, 3.1 and 3.2).
 bool keepsItsOwn(std::string_view name)
 {
@@ -209,12 +209,12 @@ seconds currentAge(const StoredResponse& stored, Date now)
 Reuse reuse(const StoredResponse& stored, const UrlRequest& request, Date now)
 {
     if (selectingFields(stored.response, request) != stored.selecting) return Reuse::None;
-    if (directivesOf(stored.response.headers).noStore) return Reuse::None; // stored explicitly, not by these rules
+    if (directivesOf(stored.response.headers).noStore) return Reuse::None; // stored by `HttpCache::store` only
     const Directives asked = requestDirectives(request.headers);
     const seconds age = currentAge(stored, now);
     const bool fresh = !asked.noCache && age < freshnessLifetime(stored.response, stored.received) &&
                        age <= asked.maxAge.value_or(kLongest) &&
-                       now >= stored.received; // after the clock was set back the age is unknown
+                       now >= stored.received; // otherwise the clock was set back, and the age is unknown
     if (fresh) return Reuse::Answer;
     return hasValidator(stored.response.headers) ? Reuse::Confirm : Reuse::None;
 }
@@ -239,7 +239,7 @@ bool confirms(const UrlResponse& notModified, const StoredResponse& stored)
 StoredResponse confirmed(StoredResponse stored, const UrlResponse& notModified, Date requested, Date received)
 {
     HttpHeaders& headers = stored.response.headers;
-    // The old answer's age doesn't hold for the confirmation.
+    // The Age of the old response doesn't apply to the new one.
     headers.remove("Age");
     for (const auto& [name, value] : notModified.headers)
         if (!keepsItsOwn(name)) headers.remove(name);

@@ -9,61 +9,61 @@
 
 namespace platform {
 
-// The rules of HTTP for a cache of one user (RFC 9111), as pure functions of a request, an answer and the time. Times
-// are whole seconds, as in header fields. Any thread.
+// The rules of HTTP for a private cache (RFC 9111) as pure functions of a request, a response and the time. Times are
+// whole seconds, as in header fields. Any thread.
 
-/// A cached answer. The body is shared with the cache: bytes in memory, or a mapped file.
+/// A cached response. The body is shared with the cache: bytes in memory, or a mapped file.
 struct CachedResponse {
     UrlResponse response;
     Bytes body;
 };
 
-/// A cached answer with what its reuse depends on.
+/// A cached response with the data on which its reuse depends.
 struct StoredResponse : CachedResponse {
-    std::string selecting; ///< `selectingFields` of the request that it answered
-    Date requested;        ///< when that request, or the last confirmation, was sent
-    Date received;         ///< when the answer, or the last confirmation, was received
+    std::string selecting; ///< `selectingFields` of its request
+    Date requested;        ///< when its request, or the last revalidation, was sent
+    Date received;         ///< when the response, or the last revalidation, was received
     bool mapped = false;   ///< the body is a mapped file
 };
 
-/// The key of an answer in a cache: the URL without its fragment.
+/// Returns the key of a response in a cache: the URL without its fragment.
 [[nodiscard]] std::string cacheKey(const Url& url);
 
 /// How a data task uses a cache.
 enum class CacheUse {
     None,
-    Fill,       ///< its answer may be stored
-    Ask,        ///< a cached answer may be used; otherwise as Fill
-    Invalidate, ///< its success removes what is stored for the URL
+    Fill,       ///< its response may be stored
+    Ask,        ///< a cached response may be used; otherwise as Fill
+    Invalidate, ///< a successful response removes the cached one
 };
-/// How this request uses a cache. None if it has credentials, a range, a body or conditions of its own.
+/// Returns how this request uses a cache: None if it has credentials, a range, a body or conditions of its own.
 [[nodiscard]] CacheUse cacheUse(const UrlRequest& request);
 
-/// The request's values of the fields named by the answer's Vary, one line each; nullopt for "*", which no request
-/// matches.
+/// Returns the request's values of the fields that the response's Vary names, one line each; nullopt for "*", which no
+/// request matches.
 [[nodiscard]] std::optional<std::string> selectingFields(const UrlResponse& response, const UrlRequest& request);
 
-/// Whether an answer may be stored and could be used: it stays fresh for some time, or can be confirmed. Only statuses
-/// that are cacheable by default qualify. The request must be one that may fill a cache.
+/// Returns true if a response may be stored and reused: its status is cacheable by default, and it is fresh for some
+/// time or can be revalidated. `cacheUse` of the request must be Fill or Ask.
 [[nodiscard]] bool isStorable(const UrlRequest& request, const UrlResponse& response, Date received);
 
-/// How long an answer is fresh: "max-age", else "Expires", else a tenth of the time since "Last-Modified". 0 if it must
-/// be confirmed each time, or if those fields can't be parsed.
+/// Returns how long a response is fresh: "max-age", else "Expires", else a tenth of the time since "Last-Modified".
+/// Returns 0 if it must be revalidated each time, or if those fields can't be parsed.
 [[nodiscard]] std::chrono::seconds freshnessLifetime(const UrlResponse& response, Date received);
 
-/// The least time since the answer left its origin.
+/// Returns the age of a cached response (RFC 9111, 4.2.3).
 [[nodiscard]] std::chrono::seconds currentAge(const StoredResponse& stored, Date now);
 
-/// How a cached answer serves a request. A stale answer is never used unconfirmed, so "must-revalidate" changes
-/// nothing.
+/// How a cached response serves a request: as it is (Answer), after revalidation (Confirm), or not. A stale response is
+/// never used without revalidation, so "must-revalidate" makes no difference.
 enum class Reuse { Answer, Confirm, None };
 [[nodiscard]] Reuse reuse(const StoredResponse& stored, const UrlRequest& request, Date now);
 
-/// The request with conditions that the cached answer's validators have changed.
+/// Returns the request with If-None-Match and If-Modified-Since from the cached response's validators.
 [[nodiscard]] UrlRequest confirmationRequest(const StoredResponse& stored, UrlRequest request);
-/// Whether an answer of status 304 confirms this cached answer: its ETag, if it has one, matches.
+/// Returns true if a response of status 304 confirms the cached one: its ETag, if it has one, matches.
 [[nodiscard]] bool confirms(const UrlResponse& notModified, const StoredResponse& stored);
-/// The cached answer updated with the header fields and times of its confirmation.
+/// Returns the cached response with the header fields and times of its revalidation.
 [[nodiscard]] StoredResponse confirmed(StoredResponse stored, const UrlResponse& notModified, Date requested,
                                        Date received);
 

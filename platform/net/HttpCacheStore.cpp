@@ -19,18 +19,18 @@ namespace {
 
 constexpr const char* kIndex = "index.db";
 constexpr std::string_view kBodySuffix = ".body";
-/// Of a body that a kill left half written.
+/// Suffix of a body whose write a kill interrupted.
 constexpr std::string_view kUnfinishedSuffix = ".tmp";
-/// What an entry takes beside its texts and body, about.
+/// Estimated bytes of an entry besides its texts and body.
 constexpr std::uint64_t kEntrySize = 1024;
-/// Uses are saved with the next change, or when this many wait.
+/// Uses are saved with the next change, or when this many are pending.
 constexpr std::size_t kMaximumUnsavedUses = 256;
 /// Mappings are cached, at most this many and with at most these bytes together: creating one can cost far more than
 /// reading it.
 constexpr std::size_t kMaximumMappings = 64;
 constexpr std::size_t kMostMapped = 16u << 20;
 
-/// The small table is read whole when the index is opened, and written with every use.
+/// "entry" is separate because it is read completely when the index is opened, and written with every use.
 constexpr std::array kSchema{
     "CREATE TABLE entry (id INTEGER PRIMARY KEY AUTOINCREMENT, key TEXT NOT NULL UNIQUE, size INTEGER NOT NULL,"
     " used INTEGER NOT NULL)",
@@ -39,7 +39,7 @@ constexpr std::array kSchema{
     " selecting TEXT NOT NULL, requested INTEGER NOT NULL, received INTEGER NOT NULL, bodySize INTEGER NOT NULL,"
     " xxh3 INTEGER NOT NULL, body TEXT)"};
 
-/// Header fields as lines; one with a line end in it can't have come by HTTP, and is left out.
+/// Returns header fields as lines. Leaves out a field that contains a line end, which can't have arrived by HTTP.
 std::string linesOf(const HttpHeaders& headers)
 {
     std::string lines;
@@ -62,8 +62,7 @@ HttpHeaders headersOf(std::string_view lines)
     return headers;
 }
 
-/// Goes on from the digest of what came before. It sees damage, such as pages that never came to the disk; it is no
-/// defence against someone who means harm.
+/// Continues the digest `before`. XXH3 detects damage, such as pages that never reached the disk, but no manipulation.
 std::uint64_t digestOf(std::string_view bytes, std::uint64_t before)
 {
     return XXH3_64bits_withSeed(bytes.data(), bytes.size(), before);
@@ -79,7 +78,7 @@ Error damaged(std::string reason)
     return Error::withReason(std::string(kSqliteErrorDomain), Sqlite::kCorrupt, std::move(reason));
 }
 
-/// The entry's number in the name of its file.
+/// Returns the entry's number in the name of its file, or nothing for other files.
 std::optional<std::int64_t> idOf(std::string_view name)
 {
     if (!name.ends_with(kBodySuffix)) return std::nullopt;
@@ -91,7 +90,7 @@ std::optional<std::int64_t> idOf(std::string_view name)
 
 } // namespace
 
-/// Of the table "answer".
+/// A row of the table "answer".
 struct HttpCacheStore::Row {
     std::int64_t id = 0;
     std::int64_t status = 0;
@@ -124,9 +123,9 @@ Result<std::unique_ptr<HttpCacheStore>> HttpCacheStore::open(FileSystem& files, 
     std::unique_ptr<HttpCacheStore> store(new HttpCacheStore(files, directory, limits, std::move(*lock)));
     auto opened = store->openIndex();
     if (!opened && Sqlite::isDamage(opened.error())) {
-        defaultLog().error("the HTTP cache {} is damaged and begun anew: {}", directory.string(),
+        defaultLog().error("the HTTP cache {} is damaged and starts empty: {}", directory.string(),
                            opened.error().description());
-        opened = store->beginAnew();
+        opened = store->reset();
     }
     if (!opened) return std::unexpected(std::move(opened.error()));
     return store;
@@ -143,7 +142,7 @@ bool HttpCacheStore::isInPlace() const
     return info && info->number == _indexNumber;
 }
 
-Result<void> HttpCacheStore::beginAnew()
+Result<void> HttpCacheStore::reset()
 {
     _index.reset();
     _uses.clear();
@@ -162,7 +161,7 @@ Result<void> HttpCacheStore::openIndex()
     const auto info = _files.info(_directory / kIndex);
     if (!info) return std::unexpected(info.error());
     _indexNumber = info->number;
-    (void)_index->execute("PRAGMA synchronous = NORMAL"); // consistent after a power cut, if not of the last moment
+    (void)_index->execute("PRAGMA synchronous = NORMAL"); // consistent after a power cut, without the latest changes
 
     auto adopted = _index->adopt(kSchema);
     return adopted ? sweep() : std::move(adopted);
@@ -221,7 +220,7 @@ Result<std::shared_ptr<const StoredResponse>> HttpCacheStore::find(const std::st
                         if (!found.isNull(9)) row->body = text(9);
                     });
     if (!read) {
-        // A file that became shorter than its index says.
+        // SQLite reports this for a truncated file.
         if (read.error().code == SQLITE_IOERR) return std::unexpected(damaged("the index can't be read"));
         return std::unexpected(std::move(read.error()));
     }
@@ -232,7 +231,7 @@ Result<std::shared_ptr<const StoredResponse>> HttpCacheStore::find(const std::st
         mapped ? mapBody(row->id, static_cast<std::uint64_t>(row->bodySize)) : Bytes(std::move(*row->body));
     auto url = row->url == likely.string() ? std::optional(likely) : Url::parse(row->url);
     if (!body || !url || row->digestWith(key, body->view()) != row->digest) {
-        defaultLog().error("an answer in the HTTP cache is damaged and dropped: {}", row->id);
+        defaultLog().error("response {} in the HTTP cache is damaged and dropped", row->id);
         if (auto removed = remove(key); !removed) return std::unexpected(std::move(removed.error()));
         return nullptr;
     }
@@ -353,7 +352,7 @@ fs::path HttpCacheStore::bodyPath(std::int64_t id) const
     return _directory / fmt::format("{}{}", id, kBodySuffix);
 }
 
-/// Returns nothing if the file isn't there whole. A kept mapping is used only while its file is still in place.
+/// Returns nothing if the file is missing or has another size. Uses a cached mapping only if its file was not replaced.
 std::optional<Bytes> HttpCacheStore::mapBody(std::int64_t id, std::uint64_t size)
 {
     if (const auto kept = std::ranges::find(_mappings, id, &Mapping::id); kept != _mappings.end()) {

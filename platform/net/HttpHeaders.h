@@ -8,7 +8,7 @@
 
 namespace platform {
 
-/// Header fields in their order. Names are compared case-insensitively (RFC 9110). A plain value.
+/// Header fields in order. Names are compared case-insensitively (RFC 9110, 5.1). A plain value.
 class HttpHeaders {
 public:
     using Entry = std::pair<std::string, std::string>;
@@ -16,13 +16,13 @@ public:
     HttpHeaders() = default;
     HttpHeaders(std::initializer_list<Entry> entries) : _entries(entries) {}
 
-    /// The value of the first field of that name; null if there is none. Valid until the next change.
+    /// Returns the value of the first field of that name, or null. Valid until the next change.
     [[nodiscard]] const std::string* find(std::string_view name) const;
-    /// The values of all fields of that name, joined by commas into one list (RFC 9110, 5.3).
+    /// Returns the values of all fields of that name, joined by commas (RFC 9110, 5.3).
     [[nodiscard]] std::string list(std::string_view name) const;
     /// Replaces all fields of that name by one.
     void set(std::string name, std::string value);
-    /// Appends a field, whether or not others have its name.
+    /// Appends a field; keeps others of that name.
     void add(std::string name, std::string value) { _entries.emplace_back(std::move(name), std::move(value)); }
     void remove(std::string_view name);
 

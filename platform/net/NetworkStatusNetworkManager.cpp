@@ -17,7 +17,7 @@ class NetworkManagerStatus final : public NetworkStatus {
 public:
     explicit NetworkManagerStatus(RunLoop& runLoop)
         : NetworkStatus([this, &runLoop] { runLoop.execute(Priority::Default, [this] { follow(); }); }),
-          _bus(runLoop, ipc::SystemBus::Bus::System, [this] { lose("the system bus has gone"); })
+          _bus(runLoop, ipc::SystemBus::Bus::System, [this] { lose("the system bus has disconnected"); })
     {}
 
 private:
@@ -43,7 +43,7 @@ private:
 
     void lose(const std::string& reason)
     {
-        defaultLog().info("unknown network state, taken as online and unmetered: {}", reason);
+        defaultLog().info("the network state is unknown and counts as online and unmetered: {}", reason);
         set({});
     }
 
@@ -61,7 +61,7 @@ std::unique_ptr<NetworkStatus> makeNetworkManagerStatus(RunLoop& runLoop)
 
 NetworkState networkStateOf(std::uint32_t state, std::uint32_t metered)
 {
-    // Below this state there is no route beyond the link; 0 means that NetworkManager doesn't know.
+    // NM_STATE_CONNECTED_SITE; states below it have no default route. 0 is NM_STATE_UNKNOWN.
     constexpr std::uint32_t kConnectedSite = 60;
     constexpr std::uint32_t kYes = 1;
     constexpr std::uint32_t kGuessYes = 3;

@@ -14,14 +14,14 @@ namespace platform {
 namespace {
 
 constexpr std::size_t kMaximumLength = 64u << 10;
-/// An ASCII host name has 253 characters at most; its Unicode form in UTF-8 isn't much longer.
+/// Bytes. An ASCII host name has at most 253 characters; its Unicode form in UTF-8 isn't much longer.
 constexpr std::size_t kMaximumHost = 1024;
-/// Parsing keeps paths as they are (CURLU_PATH_AS_IS in addition); resolving removes dot segments.
+/// Flags for resolving, which removes dot segments. Parsing adds CURLU_PATH_AS_IS, which keeps them.
 constexpr unsigned kFlags = CURLU_NON_SUPPORT_SCHEME | CURLU_NO_AUTHORITY;
 
 using Handle = std::unique_ptr<CURLU, decltype(&curl_url_cleanup)>;
 
-/// Parses a URL; null if it is invalid.
+/// Parses a URL; returns null if it is invalid.
 Handle parsed(const std::string& text)
 {
     Handle handle(curl_url(), curl_url_cleanup);
@@ -71,7 +71,7 @@ template <class Keep> std::string percentEncode(std::string_view text, Keep keep
     return result;
 }
 
-/// Characters that a URL may have unencoded, and "%".
+/// Returns true for characters that a URL may contain unencoded, and for "%".
 bool isUrlCharacter(unsigned char c)
 {
     return isUnreserved(c) || std::string_view(":/?#[]@!$&'()*+,;=%").contains(static_cast<char>(c));
@@ -85,7 +85,7 @@ int hexDigit(char c)
     return -1;
 }
 
-/// The byte encoded by the escape at `at`; -1 if there is no complete escape.
+/// Returns the byte that the escape at `at` encodes; -1 if there is no complete escape.
 int escapedByte(std::string_view text, std::size_t at)
 {
     if (text[at] != '%' || at + 2 >= text.size()) return -1;
@@ -117,7 +117,7 @@ Authority authorityIn(std::string_view text)
     return found;
 }
 
-/// The ASCII name of a Unicode host; nullopt if it has none.
+/// Returns the ASCII name of a Unicode host; nullopt if it has none.
 std::optional<std::string> asciiHost(const std::string& host)
 {
     if (host.size() > kMaximumHost) return std::nullopt;
@@ -135,12 +135,12 @@ std::optional<std::string> asciiHost(const std::string& host)
                                static_cast<std::int32_t>(name.size()), &info, &error);
     if (U_FAILURE(error) || info.errors != 0 || length <= 0) return std::nullopt;
     name.resize(static_cast<std::size_t>(length));
-    // Compatibility forms may map to delimiters ("℀" to "a/c"), and the host would end there.
+    // Compatibility characters may map to delimiters ("℀" to "a/c"), at which the host would end.
     return std::ranges::all_of(name, isUnreserved) ? std::optional(std::move(name)) : std::nullopt;
 }
 
-/// Replaces a Unicode host, percent-encoded or not, by its ASCII name. Other URLs are returned unchanged; nullopt if
-/// the host has no ASCII name.
+/// Replaces a Unicode host, percent-encoded or not, by its ASCII name. Returns other URLs unchanged, and nullopt if the
+/// host has no ASCII name.
 std::optional<std::string> withAsciiHost(std::string_view text)
 {
     const Authority at = authorityIn(text);

@@ -20,7 +20,8 @@ struct Range4 {
     int bits;
 };
 
-/// Not globally reachable: https://www.iana.org/assignments/iana-ipv4-special-registry, and multicast.
+/// IPv4 networks that are not globally reachable (https://www.iana.org/assignments/iana-ipv4-special-registry), and
+/// multicast.
 constexpr Range4 kInner4[] = {
     {0x00000000, 8},  // this network
     {0x0a000000, 8},  // private
@@ -44,7 +45,8 @@ struct Range6 {
     unsigned bits;
 };
 
-/// Within 2000::/3, all that is assigned to hosts: https://www.iana.org/assignments/iana-ipv6-special-registry.
+/// Networks inside 2000::/3, the global unicast range, that are not globally reachable
+/// (https://www.iana.org/assignments/iana-ipv6-special-registry).
 constexpr Range6 kInner6[] = {
     {{0x20, 0x01, 0x00, 0x00}, 23}, // protocol assignments, Teredo
     {{0x20, 0x01, 0x0d, 0xb8}, 32}, // documentation
@@ -58,7 +60,8 @@ bool isPublic(const in_addr& address)
                                 [a](const Range4& range) { return (a ^ range.network) >> (32 - range.bits) == 0; });
 }
 
-/// The IPv4 address that an IPv6 one stands for: mapped, compatible, behind NAT64 (RFC 6052) or 6to4 (RFC 3056).
+/// Returns the IPv4 address embedded in an IPv6 one: mapped, compatible, NAT64 (RFC 6052) or 6to4 (RFC 3056). Null if
+/// there is none.
 const unsigned char* embeddedIPv4(const in6_addr& v6)
 {
     constexpr unsigned char kNat64[12]{0, 0x64, 0xff, 0x9b};
@@ -84,7 +87,7 @@ bool isPublic(const in6_addr& address)
            std::ranges::none_of(kInner6, [&](const Range6& range) { return first(range.network, range.bits); });
 }
 
-/// Fields that say how to answer, and nothing of who asks.
+/// Returns true for fields that describe the wanted response and don't identify the client.
 bool goesToAnyOrigin(std::string_view name)
 {
     constexpr std::array<std::string_view, 6> kNames{"Accept",        "Accept-Language", "Accept-Encoding",
@@ -146,7 +149,7 @@ std::optional<Result<UrlRequest>> redirected(const UrlRequest& request, bool has
     if (std::ranges::find(kStatuses, answer.statusCode) == kStatuses.end() || !location || location->empty())
         return std::nullopt;
     const auto url = request.url.resolve(*location);
-    if (!url) return std::unexpected(urlError(kUrlForbiddenRedirect, "redirected to what is no URL"));
+    if (!url) return std::unexpected(urlError(kUrlForbiddenRedirect, "redirected to an invalid URL"));
 
     UrlRequest next = request;
     next.url = *url;

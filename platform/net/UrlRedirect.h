@@ -7,32 +7,32 @@
 
 namespace platform {
 
-// Where one URL may lead to another: redirects, and URLs that an answer names. Pure functions, any thread.
+// The rules for following redirects and URLs that a response names. Pure functions; any thread.
 
-/// Scheme, host and port ("https://example.com:443"): what a server is, for the purposes of HTTP (RFC 9110, 4.3.1).
+/// Returns the URL's origin, scheme, host and port: "https://example.com:443" (RFC 9110, 4.3.1).
 [[nodiscard]] std::string originOf(const Url& url);
 
-/// False for addresses that only lead to this device or a network of its own (loopback, private, link-local, carrier's,
-/// NAT64 of one's own) or to no host at all (documentation, benchmarking, multicast, reserved), by IANA's registries
-/// of special-purpose addresses. An IPv6 address that stands for an IPv4 one counts as that. `address` is in text form;
-/// false for text that is no address.
+/// Returns true if an IP address in text form is globally reachable by IANA's registries of special-purpose addresses.
+/// Returns false for addresses of this device or an internal network (loopback, private, link-local, carrier-grade
+/// NAT), for those of no host (documentation, benchmarking, multicast, reserved), and for text that is not an address.
+/// An IPv6 address that embeds an IPv4 address is judged by the latter.
 [[nodiscard]] bool isPublicAddress(const std::string& address);
 
-/// What limits the URLs that an answer names. Where the peer's address isn't known, a host counts as public unless it
-/// is an address that isn't, or "localhost".
+/// Returns the limits for URLs that a response names. If the peer's address isn't known, a host name other than
+/// "localhost" counts as public.
 [[nodiscard]] UrlSource sourceOf(const UrlResponse& response);
-/// The same of an answer that is still to come from this URL.
+/// Returns the limits for URLs in a future response from this URL.
 [[nodiscard]] UrlSource sourceOf(const Url& url);
 
-/// The request as it may be sent to a URL that `request.source` limits: without the URL's user information. The error
-/// (kUrlForbiddenRedirect) is for a URL that isn't http or https, or leads from https to http. Whether the host's
-/// address is public is seen only when it is connected to.
+/// Applies `request.source` to the request: removes the URL's user information. Fails with kUrlForbiddenRedirect if the
+/// URL is neither http nor https, or if it leads from https to http. Doesn't check the host's address, which is known
+/// only after connecting.
 [[nodiscard]] Result<UrlRequest> withinSource(UrlRequest request);
 
-/// The request that a redirect leads to: the URL of "Location" with `source` as its source, and the method of RFC 9110,
-/// 15.4. Nothing if the answer is no redirect. Across origins only what says how to answer goes along ("Accept" and
-/// the like): other fields, identifiers and credentials among them, are for the origin that they were meant for; and a
-/// body isn't sent again, which is an error, like a URL that `source` doesn't allow.
+/// Returns the request that follows a redirect, or nothing if the response is not a redirect. It has the URL of
+/// "Location", `source` as its source, and the method of RFC 9110, 15.4. To another origin it has only fields that
+/// describe the wanted response ("Accept" and the like), because others may contain identifiers or credentials. Fails
+/// with kUrlForbiddenRedirect if a body would be sent to another origin, or if `source` doesn't allow the URL.
 [[nodiscard]] std::optional<Result<UrlRequest>> redirected(const UrlRequest& request, bool hasBody,
                                                            const UrlResponse& answer, UrlSource source);
 

@@ -26,39 +26,39 @@ class HttpCache;
 class NetworkStatus;
 class Queue;
 
-/// Describes the answer that named a URL. The URLs of an answer may lead no further than its redirects: never from
-/// https to http, and never from a public host to an address that isn't public.
+/// Describes the response that named a URL. Such a URL is limited like a redirect: never from https to http, and never
+/// from a public host to an address that isn't public.
 struct UrlSource {
     bool secure = false;   ///< it came over https
     bool isPublic = false; ///< it came from a public address
     friend bool operator==(const UrlSource&, const UrlSource&) = default;
 };
 
-/// What to load. A plain value.
+/// A request. A plain value.
 struct UrlRequest {
     Url url;
     std::string method = "GET";
     HttpHeaders headers;
     Bytes body;
-    /// The longest time without a received byte; nullopt is the session's `requestTimeout`.
+    /// The longest time without a received byte; nullopt selects the session's `requestTimeout`.
     std::optional<Duration> timeout;
-    /// Limit of the answer's body in bytes, decoded; nullopt is the session's limit. A larger body fails the load with
-    /// kUrlTooLarge.
+    /// Limit of the response's decoded body in bytes; nullopt selects the session's limit. A larger body fails the load
+    /// with kUrlTooLarge.
     std::optional<std::size_t> maximumResponseSize = std::nullopt;
-    /// ReloadIgnoringCache uses neither cached answers nor their validators. The answer may still be stored.
+    /// ReloadIgnoringCache uses neither cached responses nor their validators. The response may still be stored.
     enum class CachePolicy { Protocol, ReloadIgnoringCache } cachePolicy = CachePolicy::Protocol;
-    /// Set if the URL was named by an answer: `sourceOf` that answer (UrlRedirect.h). It limits where the URL may lead,
-    /// and user information in the URL is not sent.
+    /// Set it to `sourceOf` the response that named the URL (UrlRedirect.h). It limits where the URL may lead, and user
+    /// information in the URL is not sent.
     std::optional<UrlSource> source = std::nullopt;
 };
 
-/// The head of an answer. An answer to a URL other than http and https has no status, and `isHttp` is false.
+/// The head of a response. A response to a URL other than http and https has no status, and `isHttp` is false.
 struct UrlResponse {
-    Url url; ///< where the answer came from, after redirects
+    Url url; ///< of the last hop, after redirects
     bool isHttp = true;
     int statusCode = 0;
     HttpHeaders headers;
-    /// True if any host of the redirect chain had a public address; nullopt if unknown (an answer read from disk).
+    /// True if any host of the redirect chain had a public address; nullopt if unknown (a response read from disk).
     std::optional<bool> publicPeer = std::nullopt;
 };
 
@@ -81,7 +81,7 @@ enum UrlErrorCode : std::int64_t {
         -1201, ///< to another scheme, to an address that isn't public, or with a body to another host
 };
 
-/// One load. It is created suspended; nothing happens before `resume()`. Any thread.
+/// One load. It is created suspended and starts with `resume()`. Any thread.
 ///
 /// A resumed task calls its completion exactly once; `cancel` completes it with kUrlCancelled. It keeps itself alive
 /// until then. A task that is dropped without `resume()` never completes.
@@ -93,41 +93,41 @@ public:
     /// Identifies the task within its session, from 1.
     [[nodiscard]] virtual std::uint64_t identifier() const = 0;
     [[nodiscard]] virtual const UrlRequest& originalRequest() const = 0;
-    /// When the stages of the load began and ended (seconds of the monotonic clock) and the peer's address: a
+    /// Returns when the stages of the load began and ended (seconds of the monotonic clock) and the peer's address: a
     /// dictionary whose keys begin with "_kCFNTimingData" (docs/timing.md). Null before the completion.
     [[nodiscard]] virtual Value timingData() const = 0;
 };
 
 /// Files that replace bodies in memory, for loads of any size.
 struct TransferFiles {
-    FileHandle upload;   ///< the request's body, sent whole from its start; if closed, `UrlRequest::body` is sent
-    FileHandle download; ///< an empty file for the answer's body; if closed, the body is counted and dropped
-    /// Called with the bytes of the upload sent so far. Runs on the loader's thread, so it must only hand work on.
+    FileHandle upload;   ///< the request's body, sent from its start; if empty, `UrlRequest::body` is sent
+    FileHandle download; ///< an empty file for the response's body; if the handle is empty, the body is dropped
+    /// Called with the bytes of the upload sent so far. Runs on the loader's thread and must not block.
     std::function<void(std::uint64_t sent, std::uint64_t expected)> progress;
 };
 
 /// Loads URLs. Any thread.
 ///
-/// - A request lost on a reused connection before any byte of its answer is sent once more, on a new connection.
+/// - A request lost on a reused connection before any byte of its response is sent once more, on a new connection.
 /// - Redirects follow the rules of UrlRedirect.h.
-/// - An answer whose body ends before its content coding does is an error.
+/// - A response whose body ends before its content coding does is an error.
 class UrlSession {
 public:
-    /// data: the body; nullopt if there is an error. response: nullopt if no answer came. error: a transport error. An
-    /// HTTP error status is not an error.
+    /// data: the body; nullopt if there is an error. response: nullopt if none was received. error: a transport error.
+    /// An HTTP error status is not an error.
     using DataCompletion = std::move_only_function<void(std::optional<Bytes> data, std::optional<UrlResponse> response,
                                                         std::optional<Error> error)>;
 
     virtual ~UrlSession() = default;
     /// `completion` runs on the session's delegate queue.
     [[nodiscard]] virtual std::shared_ptr<UrlTask> dataTask(UrlRequest request, DataCompletion completion) = 0;
-    /// Like a data task, with bodies in files; the completion's data is empty. Sent bytes count as progress like
-    /// received ones. A file that can't be read or written fails the load with an error in kPosixErrorDomain. For an
-    /// upload without a download file, a final status is the whole answer, even if it arrives before the body is sent
-    /// or the connection fails after it.
+    /// Like a data task, with bodies in files; the completion's data is empty. A sent byte postpones the time-out like
+    /// a received one. If a file can't be read or written, the load fails with an error in kPosixErrorDomain. An upload
+    /// without a download file completes with its final status, even if that arrives before the body is sent or the
+    /// connection fails after it.
     [[nodiscard]] virtual std::shared_ptr<UrlTask> transferTask(UrlRequest request, TransferFiles files,
                                                                 DataCompletion completion) = 0;
-    /// The session's cache; null if it has none.
+    /// Returns the session's cache; null if it has none.
     [[nodiscard]] virtual std::shared_ptr<HttpCache> cache() const { return nullptr; }
 };
 
@@ -135,42 +135,42 @@ public:
 struct HttpCacheConfiguration {
     std::size_t memoryCapacity = 1u << 20;   ///< bytes
     std::uint64_t diskCapacity = 100u << 20; ///< bytes
-    std::size_t minimumMappedSize = 16384;   ///< bodies of this size and more are separate files, mapped when read
-    std::filesystem::path directory;         ///< created when first needed; empty: nothing is stored on disk
-    FileSystem* files = nullptr;             ///< outlives the cache; null only without a directory
-    std::shared_ptr<Queue> queue;            ///< a serial queue for disk work; null only without a directory
-    Clock* clock = nullptr;                  ///< outlives the cache
+    std::size_t minimumMappedSize = 16384; ///< bodies of at least this many bytes are separate files, mapped when read
+    std::filesystem::path directory;       ///< created when first needed; if empty, nothing is stored on disk
+    FileSystem* files = nullptr;           ///< must outlive the cache; null only without a directory
+    std::shared_ptr<Queue> queue;          ///< a serial queue for disk work; null only without a directory
+    Clock* clock = nullptr;                ///< must outlive the cache
 };
 
 /// Options of a session.
 struct UrlSessionConfiguration {
     /// A data task times out after this time without a received byte; a transfer, without a received or sent byte.
     Duration requestTimeout = std::chrono::seconds(60);
-    /// Limit of a load's whole duration, redirects included. It ends loads that keep receiving a byte at a time.
+    /// Limit of a load's total duration with redirects. It ends loads that keep receiving a byte at a time.
     Duration totalTimeout = std::chrono::minutes(5);
     /// TCP Fast Open and TLS session tickets.
     bool allowFastOpenAndTickets = false;
     /// Transfers over https wait for a connection that may multiplex instead of opening another.
     bool pipelining = false;
-    /// While `network` is metered, connections idle for longer than this aren't reused: keeping them open costs.
-    /// Otherwise, or if nullopt, libcurl's default applies (118 s).
+    /// While `network` is metered, connections idle for longer than this are not reused. Otherwise, or if nullopt,
+    /// libcurl's default applies (118 s).
     std::optional<Duration> meteredPurgeTimeout;
-    NetworkStatus* network = nullptr; ///< outlives the loader
-    /// Limit of a body in bytes, encoded and decoded. Header fields have 256 KiB in all. A larger answer fails the load
-    /// with kUrlTooLarge.
+    NetworkStatus* network = nullptr; ///< must outlive the loader
+    /// Limit of a body in bytes, encoded and decoded. Header fields are limited to 256 KiB. A larger response fails the
+    /// load with kUrlTooLarge.
     std::size_t maximumResponseSize = 8u << 20;
     unsigned maximumRedirects = 16;
-    /// A PEM file of certification authorities that replaces the system's; empty: the system's.
+    /// A PEM file of certification authorities that replaces the system's. If empty, the system's apply.
     std::string caFile;
-    /// The cache of data tasks; nullopt: none.
+    /// The cache of data tasks, if they have one.
     std::optional<HttpCacheConfiguration> cache;
 };
 
-/// Makes sessions. There is one for the process. Any thread.
+/// Creates sessions. One for each process. Any thread.
 class UrlLoader {
 public:
     virtual ~UrlLoader() = default;
-    /// Makes a foreground session whose completions run on `delegateQueue`.
+    /// Creates a foreground session whose completions run on `delegateQueue`.
     [[nodiscard]] virtual std::shared_ptr<UrlSession> makeSession(UrlSessionConfiguration configuration,
                                                                   std::shared_ptr<Queue> delegateQueue) = 0;
 };

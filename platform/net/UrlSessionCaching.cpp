@@ -14,11 +14,11 @@ namespace {
 
 using Stored = std::shared_ptr<const StoredResponse>;
 
-/// Stores the answer if HTTP allows it.
+/// Stores the response if HTTP allows it.
 void fill(HttpCache& cache, const UrlRequest& request, const Bytes& data, const UrlResponse& response, Date requested,
           bool hadStored)
 {
-    // Stored under the URL that answered, which differs from the request's after a redirect.
+    // After a redirect the response is stored under the last URL, not under the request's.
     const Date received = cache.now();
     if (isStorable(request, response, received)) {
         StoredResponse stored;
@@ -29,11 +29,12 @@ void fill(HttpCache& cache, const UrlRequest& request, const Bytes& data, const 
         stored.received = received;
         cache.store(response.url, std::move(stored));
     } else if (hadStored && response.statusCode < 400) {
-        cache.remove(request.url); // the answer replaces it
+        cache.remove(request.url); // the new response supersedes it
     }
 }
 
-/// The answer with its body in memory. A mapped file may change while the task's owner, or a confirmation, still reads.
+/// Returns the response with its body in memory. A mapped file may change while the task's owner, or a revalidation,
+/// still reads it.
 Stored inMemory(Stored stored)
 {
     if (!stored->mapped) return stored;
@@ -43,7 +44,7 @@ Stored inMemory(Stored stored)
     return copy;
 }
 
-/// Timing data of an answer from the cache: its start and its end, now.
+/// Returns the timing data of a cached response: `start`, and now as its end.
 Value timingFromCache(double start)
 {
     const double end = monotonicSeconds();
@@ -55,12 +56,12 @@ Value timingFromCache(double start)
                       {"_kCFNTimingDataResponseEnd", end},     {"_kCFNTimingDataConnectionReused", false}};
 }
 
-/// A task that looks into the cache. Whoever moves it to Ended under the mutex runs the completion:
+/// A task that reads the cache first. The thread that sets the state to Ended under the mutex runs the completion:
 ///
 ///     suspended ──resume──► asking ──nothing, or stale──► loading ──► ended
 ///         └──────cancel──────┴──fresh, or cancel────────────────────────┘
 ///
-/// While it is loading, `cancel` cancels the load. A 304 that doesn't match the cached answer is followed by a load
+/// During Loading, `cancel` cancels the load. A 304 that doesn't match the cached response is followed by a load
 /// without conditions.
 class CachingTask final : public UrlTask, public std::enable_shared_from_this<CachingTask> {
 public:
@@ -69,7 +70,7 @@ public:
         : _loads(std::move(loads)), _cache(std::move(cache)), _delegateQueue(std::move(delegateQueue)),
           _request(std::move(request)), _completion(std::move(completion))
     {}
-    /// Makes the load, whose identifier is the task's. Called once, first.
+    /// Creates the load, whose identifier becomes the task's. Call it once, first.
     void prepare()
     {
         _load = makeLoad(_request);
@@ -128,7 +129,7 @@ private:
         load(_confirming ? makeLoad(confirmationRequest(*_stored, _request)) : nullptr);
     }
 
-    /// Starts `other`, or if null the load that `prepare` made.
+    /// Starts `other`, or if null the load that `prepare` created.
     void load(std::shared_ptr<UrlTask> other)
     {
         std::shared_ptr<UrlTask> resumed;
@@ -211,7 +212,7 @@ private:
         }
         _delegateQueue->async([self = shared_from_this(), data = std::move(data), response = std::move(response),
                                error = std::move(error)]() mutable {
-            // Moved out first: the completion may be what keeps the task's owner alive.
+            // Moved out first: the completion may own the owner of this task.
             auto completion = std::exchange(self->_completion, {});
             completion(std::move(data), std::move(response), std::move(error));
         });
@@ -222,8 +223,8 @@ private:
     const std::shared_ptr<Queue> _delegateQueue;
     const UrlRequest _request;
     std::uint64_t _identifier = 0;
-    UrlSession::DataCompletion _completion; // used by whoever ends the task
-    double _start = 0;                      // these four are set before the step that reads them
+    UrlSession::DataCompletion _completion; // used by the thread that ends the task
+    double _start = 0;                      // this and the next three are set before the step that reads them
     Stored _stored;
     bool _confirming = false;
     Date _requested;

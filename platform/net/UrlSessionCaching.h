@@ -6,11 +6,12 @@
 
 namespace platform {
 
-/// Makes a session whose data tasks look into `cache` first and fill it, by the rules of HTTP. What isn't cached, or
-/// must be confirmed, is loaded by `loads`, which must have the same delegate queue. Transfer tasks go to `loads`.
+/// Returns a session whose data tasks read `cache` first and fill it, by the rules of HTTP. `loads`, which must have
+/// the same delegate queue, performs the other loads, revalidations and transfer tasks.
 ///
-/// An answer is in the cache before the task's completion runs. Bodies from the cache are copies in memory: no change
-/// of the cache's files reaches them. Timing data of an answer from the cache has only its start and end. Any thread.
+/// A response is in the cache before the task's completion runs. Bodies from the cache are copies in memory, which
+/// changes of the cache's files don't affect. The timing data of a cached response has only its start and end. Any
+/// thread.
 [[nodiscard]] std::shared_ptr<UrlSession> makeCachingSession(std::shared_ptr<UrlSession> loads,
                                                              std::shared_ptr<HttpCache> cache,
                                                              std::shared_ptr<Queue> delegateQueue);

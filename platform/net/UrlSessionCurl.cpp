@@ -21,7 +21,7 @@ namespace platform {
 
 namespace {
 
-/// Idle connections of all hosts together. Servers close them after seconds, and each costs them and us a socket.
+/// Limit of idle connections to all hosts. Servers close them after seconds, and each takes a socket on both sides.
 constexpr long kIdleConnections = 32;
 
 class CurlTask;
@@ -36,7 +36,7 @@ public:
     void cancel(std::shared_ptr<CurlTask> task);
     /// Cancels every task and joins the thread.
     void stop();
-    /// Bytes of unfinished bodies; loader thread.
+    /// Bytes of incomplete bodies; loader thread.
     std::size_t bodiesInMemory = 0;
 
 private:
@@ -57,12 +57,12 @@ private:
     std::mutex _mutex;
     std::vector<Command> _commands;                     // under the mutex
     bool _stopping = false;                             // under the mutex
-    std::thread _thread;                                // made under the mutex
+    std::thread _thread;                                // started under the mutex
     std::map<CURL*, std::shared_ptr<CurlTask>> _active; // loader thread
     std::vector<CURL*> _spare;                          // loader thread
 };
 
-/// One load, seen from any thread.
+/// One task; any thread.
 class CurlTask final : public UrlTask, public std::enable_shared_from_this<CurlTask> {
 public:
     CurlTask(std::shared_ptr<Loader> loader, std::uint64_t identifier, UrlRequest request,
@@ -85,7 +85,7 @@ public:
         else
             completeCancelled();
     }
-    /// True for a task that was cancelled before the loader began it.
+    /// Returns true after `cancel`. The loader doesn't begin such a task.
     [[nodiscard]] bool cancelled() const { return _cancelled; }
     [[nodiscard]] std::uint64_t identifier() const override { return _identifier; }
     [[nodiscard]] const UrlRequest& originalRequest() const override { return _request; }
@@ -95,7 +95,7 @@ public:
         return _timing;
     }
 
-    /// Made when the loader begins it; null before and after. Loader thread.
+    /// Exists while the loader runs the task. Loader thread.
     std::unique_ptr<CurlLoad> load;
 
     void beginLoad()
@@ -126,7 +126,7 @@ private:
         }
         _delegateQueue->async([self = shared_from_this(), data = std::move(outcome.data),
                                response = std::move(outcome.response), error = std::move(outcome.error)]() mutable {
-            // Moved out first: the completion may be what keeps the task's owner alive.
+            // Moved out first: the completion may own the owner of this task.
             auto completion = std::exchange(self->_completion, {});
             completion(std::move(data), std::move(response), std::move(error));
         });
@@ -139,7 +139,7 @@ private:
     UrlSession::DataCompletion _completion;
     std::shared_ptr<Queue> _delegateQueue;
     const std::optional<TransferFiles> _files;
-    std::atomic<bool> _started = false; // handed to the loader, or ended without it
+    std::atomic<bool> _started = false; // passed to the loader, or cancelled before
     std::atomic<bool> _cancelled = false;
 
     mutable std::mutex _timingMutex;
@@ -255,7 +255,7 @@ void Loader::end(CURL* easy, CURLcode code, bool cancelled)
     giveBack(easy);
 }
 
-/// Ends what has taken too long, and returns the milliseconds until the next such moment.
+/// Ends the loads that have timed out, and returns the milliseconds until the next time-out.
 int Loader::nextTimeout()
 {
     const auto now = std::chrono::steady_clock::now();
@@ -272,14 +272,15 @@ int Loader::nextTimeout()
         _active.at(easy)->load->timeOut(now);
         end(easy, CURLE_OPERATION_TIMEDOUT, false);
     }
-    // Without a task there is nothing to wake for: start and cancel interrupt the wait.
+    // Without a task there is no time-out. `start` and `cancel` interrupt the wait.
     if (_active.empty()) return std::numeric_limits<int>::max();
     return static_cast<int>(std::chrono::ceil<std::chrono::milliseconds>(next - now).count());
 }
 
-/// Makes every transfer process what was read for it; returns whether any received something. With HTTP/2, libcurl 7.88
-/// reads for all streams of a connection at once, and may leave the end of one until the connection has more data:
-/// without this, 7 of 40 lists of 24 images hung. Pausing and resuming a transfer makes libcurl read for it next.
+/// Makes every transfer process its buffered input; returns true if any received something. With HTTP/2, libcurl 7.88
+/// reads for all streams of a connection at once and may leave the end of one unprocessed until the connection has more
+/// data: without this, 7 of 40 lists of 24 images hung. Pausing and resuming a transfer makes libcurl process its
+/// input.
 bool Loader::readOn()
 {
     const auto received = [this] {
@@ -362,10 +363,10 @@ public:
     std::shared_ptr<UrlSession> makeSession(UrlSessionConfiguration configuration,
                                             std::shared_ptr<Queue> delegateQueue) override
     {
-        const auto kept = std::exchange(configuration.cache, std::nullopt);
+        const auto cache = std::exchange(configuration.cache, std::nullopt);
         auto session = std::make_shared<CurlSession>(_loader, std::move(configuration), delegateQueue);
-        if (!kept) return session;
-        return makeCachingSession(std::move(session), HttpCache::make(*kept), std::move(delegateQueue));
+        if (!cache) return session;
+        return makeCachingSession(std::move(session), HttpCache::make(*cache), std::move(delegateQueue));
     }
 
 private:

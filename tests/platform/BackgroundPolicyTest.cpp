@@ -32,7 +32,7 @@ TEST(BackgroundPolicy, DelaysGrowToAnHour)
 TEST(BackgroundPolicy, OnlyWhatMayGetBetterIsTriedAgain)
 {
     const auto better = [](std::string_view domain, std::int64_t code) {
-        return mayGetBetter(Error(std::string(domain), code));
+        return isTransient(Error(std::string(domain), code));
     };
     for (const auto code : {kUrlTimedOut, kUrlConnectionLost, kUrlTlsFailed, kUrlBadResponse, kUrlCannotConnect,
                             kUrlCannotFindHost, kUrlNotConnected})
