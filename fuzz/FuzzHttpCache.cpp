@@ -64,7 +64,7 @@ FileSystem& files()
     return *system;
 }
 
-/// What was kept is found as it was, or not at all; and a cache that was opened works.
+/// Checks that a stored response is found unchanged or not at all, and that a cache that opens also works.
 void use(const fs::path& directory)
 {
     auto store = HttpCacheStore::open(files(), directory, kLimits);

@@ -26,11 +26,11 @@ std::optional<Duration> wakeTime(std::span<const ActivityWindow> windows)
     return wake;
 }
 
-Duration firstDue(const ActivityCriteria& criteria, Duration registered, std::optional<Duration> kept)
+Duration firstDue(const ActivityCriteria& criteria, Duration registered, std::optional<Duration> stored)
 {
     const Duration earliest = registered + criteria.delay;
-    if (!kept || !criteria.repeating) return earliest;
-    return std::max(earliest, std::min(*kept, registered + criteria.interval));
+    if (!stored || !criteria.repeating) return earliest;
+    return std::max(earliest, std::min(*stored, registered + criteria.interval));
 }
 
 } // namespace platform

@@ -8,25 +8,24 @@
 
 namespace platform {
 
-// What the activity scheduler decides: pure functions.
+// The decisions of the activity scheduler. Pure functions; any thread. Times are lived time.
 
-/// Whether an activity may run while the device is used like this.
+/// Returns true if an activity may run while the device is in this use.
 [[nodiscard]] bool criteriaHold(const ActivityCriteria& criteria, const DeviceUse& use);
-/// Whether that depends on the device's use at all.
+/// Returns true if `criteriaHold` depends on the use.
 [[nodiscard]] bool dependOnUse(const ActivityCriteria& criteria);
 
-/// When an activity is due, and how much later it may still run.
+/// When an activity is due, and how much later it may run.
 struct ActivityWindow {
     Duration due{};
     Duration gracePeriod{};
 };
-/// When to wake: at the last due time that lies within every activity's grace, so that as many as possible run together
-/// and none before it is due. Nothing without activities.
+/// Returns when to wake up: the latest due time that is within every activity's grace period, so that as many
+/// activities as possible run together and none before it is due. Returns nothing for no windows.
 [[nodiscard]] std::optional<Duration> wakeTime(std::span<const ActivityWindow> windows);
 
-/// When an activity that is registered at `registered` is first due: after its delay, and not before the time that an
-/// earlier process kept for it. `kept` counts for one interval at most, so that a damaged file can't put it off for
-/// long.
-[[nodiscard]] Duration firstDue(const ActivityCriteria& criteria, Duration registered, std::optional<Duration> kept);
+/// Returns when an activity is first due: after its delay, and not before `stored`, the due time that an earlier
+/// process saved. At most one interval of `stored` counts, so that a damaged file can't delay the activity for long.
+[[nodiscard]] Duration firstDue(const ActivityCriteria& criteria, Duration registered, std::optional<Duration> stored);
 
 } // namespace platform

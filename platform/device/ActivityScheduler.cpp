@@ -23,13 +23,13 @@ using namespace std::chrono_literals;
 
 namespace {
 
-/// A deferred activity, and one whose criteria don't hold, is looked at again after this.
+/// Delay of a deferred activity, and of one whose criteria don't hold.
 constexpr Duration kSoon = 5min;
-/// No repeating activity keeps a worker busy.
+/// Keeps a repeating activity from occupying a worker all the time.
 constexpr Duration kShortestInterval = 1s;
 constexpr Duration kLongest = std::chrono::hours(24 * 366);
 constexpr std::size_t kMaximumFile = 64u << 10;
-/// The due time of an activity that nobody registers any more is removed this long after it.
+/// The due time of an unregistered activity is removed this long after it.
 constexpr Duration kForgottenAfter = std::chrono::hours(24 * 60);
 
 ActivityCriteria sane(ActivityCriteria criteria)
@@ -40,8 +40,7 @@ ActivityCriteria sane(ActivityCriteria criteria)
     return criteria;
 }
 
-/// One call of a handler: the check-in, or one run. Calls `ended` when the run has ended, at the latest when its last
-/// holder lets go of it.
+/// One call of a handler: the check-in, or one run. Calls `ended` when the run ends, at the latest on destruction.
 class Call final : public Activity {
 public:
     using Ended = std::move_only_function<void(ActivityState)>;
@@ -76,7 +75,7 @@ public:
     [[nodiscard]] bool shouldDefer() const override
     {
         const ActivityCriteria held = criteria();
-        if (dependOnUse(held)) _use.ask([](const DeviceUse&) {}); // for whoever asks next
+        if (dependOnUse(held)) _use.ask([](const DeviceUse&) {}); // updates `last` for the next call
         return !criteriaHold(held, _use.last());
     }
     void setCriteria(ActivityCriteria criteria) override
@@ -113,7 +112,7 @@ public:
     {}
     ~Core() { _environment.clock.cancel(_timer); }
 
-    /// Runs `work` on the queue, if the scheduler is still there then.
+    /// Runs `work` on the queue, unless the scheduler has been destroyed by then.
     template <class Work> void onQueue(Work work)
     {
         _queue->async([weak = weak_from_this(), work = std::move(work)]() mutable {
@@ -125,16 +124,16 @@ public:
     void remove(const std::string& identifier);
 
 private:
-    /// A registration. `_entries` alone owns it: a callback that finds its entry gone, by `remove` or by another
-    /// registration of the name, does nothing.
+    /// A registration. `_entries` is the only owner: a callback does nothing if `remove` or another registration of the
+    /// name has destroyed its entry.
     struct Entry {
         const std::string identifier;
         ActivityCriteria criteria;
         const std::shared_ptr<const ActivityScheduler::Handler> handler;
         const Duration registered;
         enum class Stage { CheckingIn, Waiting, Asking, Running } stage = Stage::CheckingIn;
-        Duration next{};        ///< when it is looked at, while it waits
-        Duration gracePeriod{}; ///< how much later that may be
+        Duration next{};        ///< due time in the stage Waiting
+        Duration gracePeriod{}; ///< how much later it may run
     };
     using WeakEntry = std::weak_ptr<Entry>;
 
@@ -146,7 +145,7 @@ private:
     void _decide(const std::shared_ptr<Entry>& entry, const DeviceUse& use);
     void _run(const std::shared_ptr<Entry>& entry);
     void _ended(Entry& entry, ActivityState how);
-    /// Runs `work` with the entry on the queue, if both are still there then.
+    /// Runs `work` with the entry on the queue, unless either has been destroyed by then.
     template <class Work> void onQueue(WeakEntry entry, Work work)
     {
         onQueue([entry = std::move(entry), work = std::move(work)](Core& core) mutable {
@@ -256,7 +255,7 @@ void Core::_decide(const std::shared_ptr<Entry>& entry, const DeviceUse& use)
 void Core::_run(const std::shared_ptr<Entry>& entry)
 {
     entry->stage = Entry::Stage::Running;
-    // On disk first: a run that the process doesn't survive has been one.
+    // Saved before the run: a run that a kill interrupts counts as one.
     if (entry->criteria.repeating)
         _kept[entry->identifier] = _time.now() + entry->criteria.interval;
     else
@@ -305,7 +304,7 @@ void Core::_load()
     const std::string* text = contents ? (*contents)["time"].asString() : nullptr;
     const auto mark = text ? LivedTime::Mark::parse(*text) : std::nullopt;
     if (!mark)
-        return defaultLog().error("due times of activities in {} are broken and forgotten", _environment.file.string());
+        return defaultLog().error("due times of activities in {} are damaged and ignored", _environment.file.string());
     _time = LivedTime(_environment.clock, mark);
     if (const Dictionary* due = (*contents)["due"].asDictionary())
         for (const auto& [identifier, when] : *due)

@@ -14,7 +14,7 @@ namespace {
 
 using std::chrono::seconds;
 
-/// Of the table below; what has another version is left alone.
+/// The version of the table below. A database of another version is neither read nor changed.
 constexpr std::int64_t kVersion = 1;
 
 constexpr const char* kTable = R"(
@@ -62,7 +62,7 @@ Result<std::vector<AppActivity>> AppActivities::queryAppActivitiesAfterDate(Date
     if (!database) return std::unexpected(std::move(database.error()));
     const auto version = versionOf(*database);
     if (!version) return std::unexpected(version.error());
-    if (*version != kVersion) return failure(fmt::format("{} is of version {}", _path.string(), *version));
+    if (*version != kVersion) return failure(fmt::format("{} has version {}", _path.string(), *version));
 
     std::vector<AppActivity> activities;
     const auto atMost = std::min<std::size_t>(limit, std::numeric_limits<std::int64_t>::max());
@@ -86,7 +86,7 @@ Result<void> AppActivities::add(const AppActivity& activity, Date now) const
 {
     const auto start = std::chrono::floor<seconds>(activity.start);
     const auto oldest = std::chrono::floor<seconds>(now) - kKeptFor;
-    if (start < oldest) return failure("it began more than seven days ago, and earlier activities are not kept");
+    if (start < oldest) return failure("the activity began more than seven days ago");
 
     if (auto made = _files.createDirectories(_path.parent_path()); !made) return made;
     auto database = _files.openDatabase(_path, Sqlite::Access::Shared);
@@ -95,7 +95,7 @@ Result<void> AppActivities::add(const AppActivity& activity, Date now) const
         const auto version = versionOf(*database);
         if (!version) return std::unexpected(version.error());
         if (*version != 0 && *version != kVersion)
-            return failure(fmt::format("{} is of version {}", _path.string(), *version));
+            return failure(fmt::format("{} has version {}", _path.string(), *version));
         if (*version == 0)
             if (auto made = database->execute(kTable); !made) return made;
         if (auto forgotten =

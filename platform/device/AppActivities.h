@@ -13,35 +13,34 @@ namespace platform {
 
 class FileSystem;
 
-/// Something that the user did in an application, as the application told it.
+/// Something that the user did in an application, as the application reported it.
 struct AppActivity {
     Date start; ///< whole seconds
     std::string bundleIdentifier;
     std::optional<std::string> relatedUniqueIdentifier;
     std::optional<std::string> contentUrl;
-    bool publiclyIndexable = false; ///< whether its content is open to everyone
+    bool publiclyIndexable = false; ///< the content is open to everyone
 };
 
-/// What the user does in applications: a database (docs/formats.md) that applications add to and the daemon only reads.
-/// It is opened for each call, and nothing is kept of it in between. Any thread.
+/// The database of what the user does in applications (docs/formats.md). Applications add to it; the daemon only reads.
+/// Opens the database for each call and keeps nothing in memory. Any thread.
 class AppActivities {
 public:
-    /// Activities that began earlier than this are removed when one is added.
+    /// `add` removes activities that are older than this.
     static constexpr auto kKeptFor = std::chrono::days(7);
 
-    /// `directory` holds the database, which need not be there. `files` must outlive this.
+    /// `directory` is the database's; neither need exist. `files` must outlive this object.
     AppActivities(FileSystem& files, const std::filesystem::path& directory)
         : _files(files), _path(directory / "app-activities.db")
     {}
 
-    /// Returns the first `limit` activities that began from `from` to `to`, both included, by date; those of the same
-    /// second in the order in which they were added. Waits for nobody: fails at once if the database isn't there
-    /// (ENOENT), is locked or damaged, or has another version.
+    /// Returns the first `limit` activities that began between `from` and `to`, both included, ordered by second, then
+    /// by insertion. Never waits: fails if the database is missing (ENOENT), locked, damaged, or of another version.
     [[nodiscard]] Result<std::vector<AppActivity>> queryAppActivitiesAfterDate(Date from, Date to,
                                                                                std::size_t limit) const;
 
-    /// Adds one; makes the database and its directory if they are missing. Waits up to a second for others that add.
-    /// Fails for an activity older than `kKeptFor`.
+    /// Adds an activity; creates the database and its directory if they are missing. Waits up to one second for other
+    /// writers. Fails for an activity older than `kKeptFor`.
     [[nodiscard]] Result<void> add(const AppActivity& activity, Date now) const;
 
 private:

@@ -12,20 +12,21 @@ namespace platform {
 class FileHandle;
 class FileSystem;
 
-/// Holds the source files from which the device's text recognisers know words, one for each kind. Any thread, but one
-/// at a time for each kind.
+/// Stores the source files of the device's text recognisers, one for each kind. Any thread, one at a time for each
+/// kind.
 class DataDetectorStore {
 public:
     virtual ~DataDetectorStore() = default;
-    /// Makes a copy of `file` the source of the kind, identified by `signature`; null removes the source. After an
-    /// error the kind has either its old source or one without a signature.
+    /// Replaces the source of the kind by a copy of `file`, identified by `signature`; null removes the source. After
+    /// an error the kind has either its old source or one without a signature.
     [[nodiscard]] virtual Result<void> setSource(int kind, const FileHandle* file, const std::string& signature) = 0;
-    /// Returns the signature of the kind's source; nothing if there is no source or it may be incomplete.
+    /// Returns the signature of the kind's source; nothing if the source is missing or may be incomplete.
     [[nodiscard]] virtual std::optional<std::string> clientSignature(int kind) = 0;
 };
 
-/// Keeps the files "KIND.source" and "KIND.signature" in a directory, which it makes with the first of them. The
-/// signature is written last and removed first, so that it never stands for another source, even after a kill.
+/// Returns a store with the files "KIND.source" and "KIND.signature" in a directory, which it creates with the first
+/// file. The signature is written last and removed first, so that it never belongs to another source, even after a
+/// kill. `files` must outlive the store.
 [[nodiscard]] std::unique_ptr<DataDetectorStore> makeDataDetectorStore(FileSystem& files,
                                                                        std::filesystem::path directory);
 

@@ -34,10 +34,10 @@ namespace ipc {
 class Transport;
 }
 
-/// The device that the daemon runs on: what services need from outside, by role.
+/// The device that the daemon runs on: everything that services need from outside, by role.
 ///
-/// Set once, before the first service is made: any thread may read it. Its maker owns the parts and keeps them alive
-/// longer than every service. `SystemDevice` is the real one, tests/support has one of fakes.
+/// Constant after its creation: any thread may read it. The creator owns the parts, which must outlive every service.
+/// `SystemDevice` is the real one; tests/support has one of fakes.
 struct Device {
     Clock& clock;
     Executor& executor;     ///< worker threads
@@ -68,14 +68,14 @@ struct Device {
     [[nodiscard]] std::shared_ptr<Queue> serialQueue(std::string label, Priority priority = Priority::Default) const;
     [[nodiscard]] std::shared_ptr<Queue> concurrentQueue(std::string label,
                                                          Priority priority = Priority::Default) const;
-    /// The shared concurrent queue of that priority, for work that guards no state.
+    /// Returns the shared concurrent queue of a priority, for work that guards no state.
     [[nodiscard]] std::shared_ptr<Queue> globalQueue(Priority priority) const;
-    /// A queue whose tasks run on the main thread.
+    /// Returns a queue whose tasks run on the main thread.
     [[nodiscard]] std::shared_ptr<Queue> mainQueue() const;
 
-    std::array<std::shared_ptr<Queue>, 3> globalQueues{}; ///< by Priority; made by makeQueues
+    std::array<std::shared_ptr<Queue>, 3> globalQueues{}; ///< by Priority; set by makeQueues
     std::shared_ptr<Queue> main{};
-    /// Makes the two above. The maker of a Device calls it once.
+    /// Creates the queues above. The creator of a Device calls it once.
     void makeQueues();
 };
 

@@ -38,7 +38,7 @@ public:
         std::lock_guard lock(_mutex);
         if (!_profile) {
             _profile = read();
-            // The watch lives on the run loop's thread. What changed before it was made is reported once.
+            // The watch lives on the run loop's thread. `changed` reports a change that preceded it.
             _runLoop.execute(Priority::Default, [this] {
                 _watch.emplace(_runLoop, _path, [this] { changed(); });
                 changed();

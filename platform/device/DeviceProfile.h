@@ -13,13 +13,13 @@ namespace platform {
 class FileSystem;
 class RunLoop;
 
-/// What the device's maker or administrator tells about the device, in device.json. All members may be missing.
+/// What the manufacturer or administrator says about the device in device.json. All members may be missing.
 struct DeviceProfile {
     std::optional<std::string> countryCode;      ///< "countryCode": ISO 3166, overrides the locale's region
     std::optional<std::string> storefront;       ///< "storefront": the media store's storefront identifier
     bool managedAccount = false;                 ///< "managedAccount"
-    bool newsSubscribed = false;                 ///< "newsSubscribed": to the maker's own news
-    double screenScale = 1.0;                    ///< "screenScale": 0.5 to 8; else 1.0
+    bool newsSubscribed = false;                 ///< "newsSubscribed": to the manufacturer's own news
+    double screenScale = 1.0;                    ///< "screenScale": 0.5 to 8, otherwise 1.0
     std::optional<std::string> geoMetadata;      ///< "geoMetadata": the geo client's metadata string
     std::optional<std::string> geoEnvironment;   ///< "geoEnvironment": name of the geo resource environment
     std::optional<std::string> geoSessionId;     ///< "geoSession" / "id"
@@ -36,12 +36,13 @@ class DeviceProfileSource {
 public:
     virtual ~DeviceProfileSource() = default;
     [[nodiscard]] virtual DeviceProfile profile() = 0;
-    /// Adds a handler, which is called on the run loop's thread with the new profile after every change.
+    /// Adds a handler, which runs on the run loop's thread with the new profile after every change.
     virtual void onChange(std::function<void(const DeviceProfile&)> handler) = 0;
 };
 
-/// Reads `path` (device.json) with the first request, and again after changes. A missing file is an empty profile, and
-/// so is a broken one, which is logged. Destroyed on the run loop's thread; all arguments must outlive the source.
+/// Returns a source that reads `path` (device.json) with the first request, and again after changes. A missing file is
+/// an empty profile; so is a damaged one, which is logged. Destroy it on the run loop's thread; `files` and the run
+/// loop must outlive it.
 [[nodiscard]] std::unique_ptr<DeviceProfileSource>
 makeDeviceProfileSource(FileSystem& files, std::filesystem::path path, RunLoop& runLoop);
 

@@ -4,7 +4,7 @@
 
 namespace platform {
 
-/// How the device is used at the moment, as far as work that can wait depends on it.
+/// The current use of the device, on which deferrable work depends.
 struct DeviceUse {
     bool onBattery = false;
     bool screenInUse = false; ///< the session is active, neither locked nor idle
@@ -12,14 +12,15 @@ struct DeviceUse {
     friend bool operator==(const DeviceUse&, const DeviceUse&) = default;
 };
 
-/// Finds out the use on request, and follows nothing in between. Any thread.
+/// Reports the use on request; observes nothing in between. Any thread.
 class DeviceUseSource {
 public:
     using Answer = std::move_only_function<void(const DeviceUse&)>;
     virtual ~DeviceUseSource() = default;
-    /// Calls `answer` once, within half a minute, on any thread but never inside this call. It must only hand work on.
+    /// Calls `answer` once, within 25 s (the time-out of D-Bus), on any thread, never inside this call. `answer` must
+    /// not block: it should post to a queue.
     virtual void ask(Answer answer) = 0;
-    /// Returns the last answer; before the first one mains, no one at the screen, unlocked.
+    /// Returns the last known use; before the first answer: on mains, screen not in use, unlocked.
     [[nodiscard]] virtual DeviceUse last() = 0;
 };
 

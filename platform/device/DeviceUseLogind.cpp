@@ -36,10 +36,10 @@ public:
         {
             std::lock_guard lock(_mutex);
             _waiting.push_back(std::move(answer));
-            if (_waiting.size() > 1) return; // the question is on its way
+            if (_waiting.size() > 1) return; // a request is pending
         }
         _runLoop.execute(Priority::Default, [this] {
-            // The session of this process or, for a service of the user, the user's session at the screen.
+            // "auto" is the session of this process or, for a user service, the user's graphical session.
             _bus.getProperties({kService, "/org/freedesktop/login1/session/auto", "org.freedesktop.login1.Session"},
                                [this](const auto& properties) { answered(properties); });
         });
@@ -96,7 +96,7 @@ bool isOnBattery(const std::filesystem::path& supplies)
     for (const std::string& name : files->list(supplies).value_or(std::vector<std::string>())) {
         const auto line = [&](const char* file) { return lineOf(*files, supplies / name / file); };
         if (line("online") == "1") return false;
-        // The battery of a mouse or the like has the scope "Device".
+        // The battery of a peripheral, such as a mouse, has the scope "Device".
         battery = battery || (line("type") == "Battery" && line("scope") != "Device" && line("present") != "0");
     }
     return battery;

@@ -9,13 +9,14 @@ namespace platform {
 
 class RunLoop;
 
-/// Reads the power supplies in `supplies` and asks logind over the system bus. Without supplies the device is on mains;
-/// without logind no one is at the screen, and the device is unlocked. Made and destroyed on the run loop's thread; the
-/// run loop must outlive it.
+/// Returns a source that reads the power supplies in `supplies` and asks logind over the system bus. Without supplies
+/// the device counts as on mains; without logind the screen counts as not in use and the device as unlocked. Create and
+/// destroy it on the run loop's thread; the run loop must outlive it.
 [[nodiscard]] std::unique_ptr<DeviceUseSource>
 makeSystemDeviceUse(RunLoop& runLoop, std::filesystem::path supplies = "/sys/class/power_supply");
 
-/// Returns true if the kernel's power supplies include a battery of the device's own, and none is plugged in.
+/// Returns true if the kernel's power supplies include a battery of the device itself, and none is online. A battery of
+/// a peripheral doesn't count.
 [[nodiscard]] bool isOnBattery(const std::filesystem::path& supplies);
 
 } // namespace platform

@@ -26,9 +26,9 @@ namespace {
 
 constexpr std::size_t kMaximumApplications = 10'000;
 constexpr int kMaximumDepth = 4;
-constexpr std::size_t kMaximumFolders = 1'000; // below one data directory, as the next
+constexpr std::size_t kMaximumFolders = 1'000; // below one data directory, like the next
 constexpr std::size_t kMaximumNames = 100'000;
-/// The watches of all processes of a user have a common limit.
+/// Small, because all processes of a user share the limit of inotify watches.
 constexpr std::size_t kMaximumWatches = 32;
 constexpr std::size_t kMaximumEntrySize = 1u << 20;
 constexpr std::size_t kMaximumMetadataSize = 4u << 20;
@@ -41,7 +41,7 @@ std::string_view trimmed(std::string_view text)
     return text.substr(begin, text.find_last_not_of(" \t\r") + 1 - begin);
 }
 
-/// The keys of an entry's main group, as they stand.
+/// Returns the keys of an entry's main group; values are not unescaped.
 std::map<std::string, std::string, std::less<>> mainGroup(std::string_view entry)
 {
     std::map<std::string, std::string, std::less<>> keys;
@@ -75,7 +75,7 @@ bool isExecutable(const std::string& program)
     return false;
 }
 
-/// Reads the file that a path leads to, over links.
+/// Reads a file; follows symbolic links.
 Result<Bytes> readThroughLinks(FileSystem& files, const fs::path& path, std::size_t limit)
 {
     std::error_code error;
@@ -91,7 +91,7 @@ std::string versionOf(FileSystem& files, const fs::path& dataDirectory, const st
         const auto metadata = readThroughLinks(files, path, kMaximumMetadataSize);
         if (!metadata) {
             if (metadata.error().code != ENOENT)
-                defaultLog().info("application metadata is not read: {}", metadata.error().description());
+                defaultLog().info("application metadata can't be read: {}", metadata.error().description());
             continue;
         }
         if (auto version = firstReleaseVersion(metadata->view())) return *version;
@@ -99,17 +99,17 @@ std::string versionOf(FileSystem& files, const fs::path& dataDirectory, const st
     return "0";
 }
 
-/// What shows that entries came or went in a folder: the time of its last change alone is too coarse.
+/// Changes when entries are added to or removed from a directory. The time alone is too coarse.
 struct FolderState {
-    std::int64_t changed = 0; ///< nanoseconds since 1970; 0 if there is no such folder
+    std::int64_t changed = 0; ///< ctime, nanoseconds since 1970; 0 if the directory is missing
     std::size_t names = 0;
     bool operator==(const FolderState&) const = default;
 };
 using FolderStates = std::map<fs::path, FolderState>;
 
-/// The desktop entries below one folder by file ID, and the folders that were looked through.
+/// The desktop entries below one directory by file ID, and the directories that were scanned.
 ///
-/// Links to folders are followed, but every folder is looked through once, however many paths lead to it.
+/// Follows symbolic links to directories, but scans each directory once, however many paths lead to it.
 struct EntryFolder {
     std::map<std::string, fs::path> entries;
     FolderStates folders;
@@ -118,9 +118,9 @@ struct EntryFolder {
     {
         walk(root, "", 1);
         if (folders.size() == kMaximumFolders || _names >= kMaximumNames)
-            defaultLog().error("not all of {} is looked through: {} folders, {} names", root.string(), folders.size(),
+            defaultLog().error("{} is scanned only in part: {} directories, {} names", root.string(), folders.size(),
                                _names);
-        folders.try_emplace(root); // it may come
+        folders.try_emplace(root); // a missing one may be created later
     }
 
 private:
@@ -134,7 +134,7 @@ private:
         if (error) return;
         FolderState& state = folders[folder];
         state.changed = dateFromSystemTime(status.st_ctim.tv_sec, status.st_ctim.tv_nsec).time_since_epoch().count();
-        // Folders before links to folders, so that the same path is taken whichever the file system lists first.
+        // Directories before links to directories: the result doesn't depend on the order of the listing.
         std::set<std::pair<bool, std::string>> inner;
         for (; each != fs::directory_iterator() && _names < kMaximumNames; each.increment(error), ++_names) {
             if (error) break;
@@ -169,13 +169,13 @@ public:
 
     std::vector<InstalledApplication> applications() override
     {
-        std::map<std::string, std::optional<std::string>> found; // identifier to version; none is not installed
+        std::map<std::string, std::optional<std::string>> found; // identifier to version; no version: not installed
         for (const fs::path& directory : _dataDirectories) {
             for (const auto& [identifier, path] : EntryFolder(directory / "applications").entries) {
                 if (found.contains(identifier)) continue;
                 const auto entry = readThroughLinks(_files, path, kMaximumEntrySize);
                 if (!entry) {
-                    defaultLog().info("desktop entry is not read: {}", entry.error().description());
+                    defaultLog().info("a desktop entry can't be read: {}", entry.error().description());
                     continue;
                 }
                 if (found.size() == kMaximumApplications) {
@@ -196,7 +196,7 @@ public:
         if (std::exchange(_watching, true)) return;
         _runLoop.execute(Priority::Default, [this] {
             look(false);
-            afterSettling([this] { look(false); }); // watches are not made while the process starts
+            afterSettling([this] { look(false); }); // creates the watches, after the start of the process
         });
     }
 
@@ -209,7 +209,7 @@ private:
         return result;
     }
 
-    /// Has a worker look through all folders. Afterwards tells the handler if `tell` or if they are not as they were.
+    /// Makes a worker scan all directories. Afterwards calls the handler if `tell` is set or a directory has changed.
     void look(bool tell)
     {
         _tell = _tell || tell;
@@ -224,7 +224,7 @@ private:
                                   folders.merge(EntryFolder(directory / "applications").folders);
                               runLoop.execute(Priority::Default, [alive, this, folders = std::move(folders)]() mutable {
                                   if (!alive.expired())
-                                      looked(std::move(folders)); // this is destroyed on the same thread
+                                      looked(std::move(folders)); // `this` is destroyed on the same thread
                               });
                           });
     }
@@ -236,7 +236,7 @@ private:
         const bool same = first || *_folders == folders;
         _folders = std::move(folders);
         const bool tell = std::exchange(_tell, false) || !same;
-        // What changed after the look and before its watches were made is found by another look.
+        // Another scan finds changes between this one and its watches.
         if ((!first && watchFolders()) || std::exchange(_lookAgain, false)) look(false);
         if (!tell) return;
         std::function<void()> handler;
@@ -247,14 +247,15 @@ private:
         if (handler) handler();
     }
 
-    /// Watches the known folders; returns true if one was not watched before.
+    /// Watches the known directories; returns true if a watch is new.
     bool watchFolders()
     {
         bool isNew = false;
         std::map<fs::path, std::unique_ptr<FileWatch>> watches;
         for (const auto& [folder, state] : *_folders) {
             if (watches.size() == kMaximumWatches) {
-                defaultLog().error("of {} folders of applications, {} are watched", _folders->size(), kMaximumWatches);
+                defaultLog().error("{} of {} directories of applications are watched", kMaximumWatches,
+                                   _folders->size());
                 break;
             }
             auto known = _watches.extract(folder);
@@ -292,15 +293,15 @@ private:
 
     // Run loop's thread
     std::map<fs::path, std::unique_ptr<FileWatch>> _watches;
-    std::optional<Clock::TimerId> _settling; // until the next look
-    std::optional<FolderStates> _folders;    // as last seen
+    std::optional<Clock::TimerId> _settling; // set until the next scan
+    std::optional<FolderStates> _folders;    // of the last scan
     bool _looking = false;
     bool _lookAgain = false;
     bool _tell = false;
     const std::shared_ptr<void> _alive = std::make_shared<int>();
 };
 
-/// What the XML parser has met so far.
+/// The state of the XML parser's handler.
 struct MetadataReader {
     XML_Parser parser;
     std::optional<std::string> version;

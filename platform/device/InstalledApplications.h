@@ -25,33 +25,34 @@ struct InstalledApplication {
 class InstalledApplications {
 public:
     virtual ~InstalledApplications() = default;
-    /// Reads the applications, ordered by identifier. Takes time: not on the run loop's thread.
+    /// Returns the applications, ordered by identifier. Reads many files: don't call it on the run loop's thread.
     [[nodiscard]] virtual std::vector<InstalledApplication> applications() = 0;
-    /// Calls `handler` on the run loop's thread after applications came or went: once for all changes within two
-    /// seconds, as a package manager makes them. One handler; a new one replaces it.
+    /// Calls `handler` on the run loop's thread after applications were installed or removed: once for all changes
+    /// within two seconds, because a package manager makes many. One handler; a new one replaces it.
     virtual void onChange(std::function<void()> handler) = 0;
 };
 
-/// Reads the entries of type Application in the folders "applications" of `dataDirectories`; of several entries with
-/// one file ID the first directory's counts. Hidden entries don't count, nor do those that name a missing program to
-/// try. The version is that of the first release in the metadata, "metainfo/IDENTIFIER.metainfo.xml" or ".appdata.xml".
+/// Returns the applications of the desktop entries in the directories "applications" of `dataDirectories` (Desktop
+/// Entry and XDG Base Directory specifications). If several entries have the same file ID, the one in the first
+/// directory counts. Hidden entries don't count, nor do entries whose TryExec names a missing program. The version is
+/// that of the first release in the AppStream metadata, "metainfo/IDENTIFIER.metainfo.xml" or ".appdata.xml".
 ///
-/// The first `onChange` has `executor` look through the folders; watches follow two seconds later, and report what
-/// changed in between. Links are followed, since some package formats install links, but every folder is looked through
-/// once. Limits, logged if met: 10,000 applications; below each data directory 1,000 folders, four deep, with 100,000
-/// names; 32 folders watched; 1 MiB an entry; 4 MiB of metadata.
+/// The first `onChange` makes `executor` scan the directories; watches follow two seconds later, and report changes in
+/// between. Symbolic links are followed, because some package formats install links, but each directory is scanned
+/// once. Limits, logged when reached: 10,000 applications; below each data directory 1,000 directories at most four
+/// levels deep with 100,000 names; 32 watched directories; 1 MiB for an entry; 4 MiB for metadata.
 ///
-/// Everything passed in must outlive the object. Destroyed on the run loop's thread.
+/// The arguments must outlive the object. Destroy it on the run loop's thread.
 [[nodiscard]] std::unique_ptr<InstalledApplications>
 makeInstalledApplications(FileSystem& files, std::vector<std::filesystem::path> dataDirectories, RunLoop& runLoop,
                           Executor& executor, Clock& clock);
 
-/// Returns true if the text of a desktop entry is that of an application that can be started. `isExecutable` is asked
-/// about the program that the entry says to try.
+/// Returns true if the text of a desktop entry describes an application that can be started. Calls `isExecutable` with
+/// the program of TryExec, if there is one.
 [[nodiscard]] bool isInstalledApplication(std::string_view entry,
                                           const std::function<bool(const std::string&)>& isExecutable);
-/// Returns the version of the first release in AppStream metadata; nothing if there is none or the XML is broken before
-/// it.
+/// Returns the version of the first release in AppStream metadata; nothing if there is none, or if the XML before it is
+/// malformed.
 [[nodiscard]] std::optional<std::string> firstReleaseVersion(std::string_view metadata);
 
 } // namespace platform

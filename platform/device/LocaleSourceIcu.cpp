@@ -23,7 +23,7 @@ namespace fs = std::filesystem;
 
 namespace {
 
-/// "de_CH.UTF-8@euro" → "de_CH"; nothing for the locales that are no language.
+/// "de_CH.UTF-8@euro" → "de_CH"; empty for "C" and "POSIX".
 std::string withoutEncoding(std::string_view locale)
 {
     std::string name(locale.substr(0, locale.find_first_of(".@")));
@@ -39,7 +39,7 @@ std::string languageTag(const icu::Locale& locale)
     return U_SUCCESS(status) ? tag : std::string("und");
 }
 
-/// Returns the language of the user interface, with its script unless that is the language's usual one.
+/// Returns the language of the user interface, with its script if that is not the language's usual script.
 std::string systemLanguage(icu::Locale locale)
 {
     UErrorCode status = U_ZERO_ERROR;
@@ -83,7 +83,7 @@ std::optional<std::string> environment(const char* name)
     return value && *value ? std::optional<std::string>(value) : std::nullopt;
 }
 
-/// The value of NAME=VALUE or NAME="VALUE" in a shell-like settings file.
+/// Returns the value of NAME=VALUE or NAME="VALUE" in a shell-like settings file.
 std::optional<std::string> setting(const fs::path& file, std::string_view name)
 {
     constexpr int kMaximumLines = 1000;
@@ -157,8 +157,8 @@ public:
     }
 
 private:
-    /// The system's files count only after they have changed: until then the environment does, which a login made from
-    /// them.
+    /// Reads the system's files only after they have changed: before that the environment counts, which the login set
+    /// from them.
     LocaleContext read()
     {
         std::optional<std::string> name;
@@ -176,7 +176,7 @@ private:
         return localeContext(name.value_or(""), languages.value_or(""));
     }
 
-    /// The watches live on the loop's thread.
+    /// Creates the watches on the loop's thread.
     void startWatching()
     {
         _runLoop.execute(Priority::Default, [this] {

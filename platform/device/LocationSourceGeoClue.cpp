@@ -19,7 +19,7 @@ constexpr std::uint32_t kAccuracyCity = 4;
 constexpr std::uint32_t kAccuracyStreet = 6;
 constexpr std::uint32_t kAccuracyExact = 8;
 
-/// GeoClue doesn't say what a fix came from; its accuracy in metres tells it well enough.
+/// GeoClue doesn't report the source of a fix; this guesses it from the accuracy in metres.
 std::string sourceForAccuracy(double metres)
 {
     return metres <= 50 ? "gps" : metres <= 1500 ? "wifi" : "cell";
@@ -29,7 +29,7 @@ class GeoClueLocation final : public LocationSource {
 public:
     GeoClueLocation(RunLoop& runLoop, std::string desktopId)
         : _runLoop(runLoop), _desktopId(std::move(desktopId)),
-          _bus(runLoop, ipc::SystemBus::Bus::System, [this] { forget("the system bus has gone"); })
+          _bus(runLoop, ipc::SystemBus::Bus::System, [this] { forget("the system bus has disconnected"); })
     {}
 
     void setAllowedSources(std::set<std::string> sources) override
@@ -43,7 +43,7 @@ public:
     }
     void requestUpdate() override
     {
-        // A running client reports every change of place; only a failed start is worth another try.
+        // A running client reports every move, so only a failed start is repeated.
         std::lock_guard lock(_mutex);
         if (!_wantsRestart) return;
         _wantsRestart = false;
@@ -61,7 +61,7 @@ private:
         if (sources == _allowed) return;
         _allowed = sources;
         if (_allowed.empty()) return stop("no source is allowed");
-        // A client keeps the accuracy that it was started with, and is not told its last place again.
+        // A client keeps the accuracy with which it was started, so other sources need another client.
         if (_client) stop("other sources are allowed");
         start();
     }
@@ -82,7 +82,7 @@ private:
         if (!path) return lose(result ? "GeoClue gave no client" : result.error().message, true);
         _client = {kService, *path, "org.freedesktop.GeoClue2.Client"};
         _updates = _bus.onSignal(*_client, "LocationUpdated", [this](const ipc::CallResult& places) {
-            // The place before, and the place now.
+            // The arguments are the old and the new location.
             if (places && places->args.size() == 2 && places->args[1].asString()) read(*places->args[1].asString());
         });
         _owner = _bus.onOwnerChange(kService, [this] { forget("GeoClue has gone"); });
@@ -121,7 +121,7 @@ private:
         lose(reason, false);
     }
 
-    /// The client is dead already, and another one may be asked for.
+    /// Drops a client that is dead already; `requestUpdate` may start another.
     void forget(const std::string& reason)
     {
         endClient();
@@ -164,7 +164,7 @@ private:
     ipc::SystemBus _bus; // run loop's thread, like the next five
     ipc::SystemBus::Watch _updates;
     ipc::SystemBus::Watch _owner;
-    bool _isAsking = false; // for a client
+    bool _isAsking = false; // GetClient is pending
     std::set<std::string> _allowed;
     std::optional<ipc::SystemBus::Object> _client;
     std::mutex _mutex;

@@ -9,9 +9,9 @@ namespace platform {
 
 class RunLoop;
 
-/// Asks GeoClue2 over the system bus. There is no location without a bus, the service, or the user's permission, which
-/// is given to `desktopId`. Nothing is contacted before sources are allowed. Made and destroyed on the run loop's
-/// thread; the run loop must outlive it.
+/// Returns a source that uses GeoClue2 over the system bus. It has no location if the bus, the service or the user's
+/// permission is missing; the user grants permission to `desktopId`. Connects after sources have been allowed. Create
+/// and destroy it on the run loop's thread; the run loop must outlive it.
 [[nodiscard]] std::unique_ptr<LocationSource> makeGeoClueLocationSource(RunLoop& runLoop, std::string desktopId);
 
 } // namespace platform

@@ -45,7 +45,7 @@ private:
         NotificationCenter::Token token;
     };
 
-    /// Arms or disarms the trigger, on the loop, as by then there are watchers or none.
+    /// Posts to the loop: arms the trigger if there are watchers, disarms it otherwise.
     void follow()
     {
         _runLoop.execute(Priority::Default, [weak = weak_from_this()] {
@@ -61,10 +61,10 @@ private:
     void arm()
     {
         auto trigger = _open();
-        if (!trigger) return defaultLog().info("memory pressure is not watched: {}", trigger.error().description());
+        if (!trigger) return defaultLog().info("memory pressure can't be observed: {}", trigger.error().description());
         _trigger = std::move(*trigger);
         _watch = _runLoop.watch(_trigger.fd(), EPOLLPRI, [this](std::uint32_t events) {
-            const auto self = shared_from_this(); // the last watcher may go
+            const auto self = shared_from_this(); // a callback may destroy the last watcher
             if (events & (EPOLLERR | EPOLLHUP)) return disarm();
             _watchers.post({.name = std::string(kCritical)});
         });
@@ -84,7 +84,7 @@ private:
     std::unique_ptr<RunLoop::Watch> _watch;
 };
 
-/// What the device holds: watches may outlive it.
+/// The owner's end; watches may outlive it.
 class SystemMemoryPressure final : public MemoryPressure {
 public:
     explicit SystemMemoryPressure(std::shared_ptr<PressureTrigger> trigger) : _trigger(std::move(trigger)) {}
@@ -101,7 +101,7 @@ private:
 
 Result<FileHandle> openPressureTrigger(const std::filesystem::path& path)
 {
-    constexpr std::string_view kWanted{"full 200000 2000000\0", 20}; // µs of stall in a window of µs; the kernel's form
+    constexpr std::string_view kWanted{"full 200000 2000000\0", 20}; // µs of stall, µs of the window
     FileHandle file(open(path.c_str(), O_RDWR | O_NONBLOCK | O_CLOEXEC));
     if (!file || write(file.fd(), kWanted.data(), kWanted.size()) < 0)
         return std::unexpected(Error::posix(errno, path.string()));

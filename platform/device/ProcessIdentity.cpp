@@ -20,7 +20,7 @@ namespace {
 constexpr std::size_t kMaximumPath = 4096;
 constexpr std::size_t kMaximumInfo = 64u << 10;
 
-/// Returns the contents of a small file in /proc, or nothing if it can't be read.
+/// Returns the contents of a small file in /proc; empty if it can't be read.
 std::string contentsOf(const std::string& path)
 {
     const FileHandle file(open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOFOLLOW));
@@ -49,7 +49,7 @@ public:
         const ssize_t length = readlink(fmt::format("/proc/{}/exe", pid).c_str(), path.data(), path.size());
         if (length < 0) return std::unexpected(Error::posix(errno));
         std::string result(path.data(), static_cast<std::size_t>(length));
-        // Of an executable that was replaced, as an update does, the kernel says so.
+        // The kernel appends this if the executable was removed or replaced, for example by an update.
         if (constexpr std::string_view kReplaced = " (deleted)"; result.ends_with(kReplaced))
             result.resize(result.size() - kReplaced.size());
         return result;
@@ -74,7 +74,7 @@ std::optional<std::string> flatpakName(std::string_view info)
 
 std::optional<std::string> applicationOfUnit(std::string_view unit)
 {
-    // app[-LAUNCHER]-ID[-RANDOM].scope, app[-LAUNCHER]-ID[@RANDOM].service; "-" in the id is written "\x2d".
+    // app[-LAUNCHER]-ID[-RANDOM].scope, app[-LAUNCHER]-ID[@RANDOM].service; "-" in the id is escaped as "\x2d".
     if (!unit.starts_with("app-")) return std::nullopt;
     const bool scope = unit.ends_with(".scope");
     if (!scope && !unit.ends_with(".service")) return std::nullopt;

@@ -41,7 +41,7 @@ public:
         for (const std::string& name : *names) {
             const auto path = _directory / name;
             const auto info = _files.info(path);
-            if (!info) continue; // removed meanwhile
+            if (!info) continue; // the file was removed after the listing
             if (auto service = read(path)) {
                 const std::string provider = *(*service)["provider"].asString();
                 services.erase(provider);
@@ -58,7 +58,7 @@ public:
         const bool watched = static_cast<bool>(_handler);
         _handler = std::move(handler);
         if (watched) return;
-        // The watch lives on the run loop's thread. What changed before it was made is reported once.
+        // The watch lives on the run loop's thread. `changed` covers changes that preceded it.
         _runLoop.execute(Priority::Default, [this] {
             _watch.emplace(_runLoop, _directory / "", [this] { changed(); });
             changed();

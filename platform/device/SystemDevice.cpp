@@ -43,7 +43,7 @@ namespace platform {
 
 namespace {
 
-/// Returns why the service manager started this process: a timer unit, or else the names of its sockets.
+/// Returns why the service manager started this process: the timer unit, else the names of the sockets.
 std::vector<std::string> launchEvents()
 {
     if (const char* unit = std::getenv("TRIGGER_UNIT"); unit && *unit) return {unit};
@@ -58,7 +58,7 @@ std::vector<std::string> launchEvents()
     return events;
 }
 
-/// The user's and then the system's, in order of precedence.
+/// Returns the data directories in order of precedence: the user's, then the system's.
 std::vector<std::filesystem::path> dataDirectories(const Directories& directories)
 {
     std::vector<std::filesystem::path> all = directories.systemData;
@@ -124,7 +124,7 @@ struct SystemDevice::Impl {
                  .activities = *activities,
                  .ipc = *ipc}
     {
-        // Whoever made them, an installer or an application, may have let others in.
+        // An installer or an application may have created these directories with a wider mode.
         for (const auto* parent : {&directories.caches, &directories.config, &directories.state, &directories.data})
             makePrivate(*parent / names.service);
         device.launchEvents = launchEvents();
@@ -163,7 +163,8 @@ struct SystemDevice::Impl {
 
 namespace {
 
-/// Every client takes a descriptor. The usual soft limit exists for select(), which nothing here uses.
+/// Raises the soft limit, because every client takes a descriptor. The usual limit exists for select(2), which this
+/// program doesn't use.
 void raiseDescriptorLimit()
 {
     rlimit limit{};

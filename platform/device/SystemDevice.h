@@ -8,19 +8,20 @@ namespace platform {
 struct Device;
 class RunLoop;
 
-/// The names by which the device knows the service.
+/// The product's names on the device.
 struct DeviceNames {
-    std::string service;         ///< of its files and folders in the user's directories: "com.example.service"
-    std::string sharedSuite;     ///< of the user defaults shared with clients
-    std::string objectPath;      ///< of the object that posts notify signals
+    std::string service;         ///< name of files and directories in the user's directories: "com.example.service"
+    std::string sharedSuite;     ///< name of the user defaults shared with clients
+    std::string objectPath;      ///< path of the object that posts notify signals
     std::string notifyInterface; ///< the D-Bus interface of these signals
 };
 
-/// The real device. Scans, connects and reads nothing before it is asked to; absent facilities behave as their headers
-/// say. Made on the main thread before any other thread; lives as long as the process.
+/// The real device. Creating it reads the user defaults, the counters and the directory of sockets; other parts connect
+/// and read on first use. A missing facility behaves as its header says. Create it on the main thread before other
+/// threads start; it lives as long as the process.
 class SystemDevice {
 public:
-    /// The run loop must outlive it. Raises the process's limit of open files as far as the system allows.
+    /// The run loop must outlive it. Raises the process's soft limit of open files to the hard limit.
     SystemDevice(RunLoop& runLoop, const DeviceNames& names);
     ~SystemDevice();
     [[nodiscard]] Device& device();

@@ -4,11 +4,11 @@
 
 namespace platform {
 
-/// Tells other processes of the user that something happened, by name. Any thread.
+/// Posts named events to the user's other processes. Any thread.
 class SystemNotifier {
 public:
     virtual ~SystemNotifier() = default;
-    /// Posts `name` ("com.example.changed") later, if anything can receive it.
+    /// Posts `name` ("com.example.changed") asynchronously. A failure is logged only.
     virtual void post(const std::string& name) = 0;
 };
 

@@ -20,7 +20,7 @@ public:
     {
         _runLoop.execute(Priority::Default, [this, name] {
             if (!_bus.emit(_path, _interface, "Posted", name))
-                defaultLog().info("no session bus takes the signal {}", name);
+                defaultLog().info("the signal {} can't be sent on the session bus", name);
         });
     }
 

@@ -8,9 +8,9 @@ namespace platform {
 
 class RunLoop;
 
-/// Emits the signal "Posted" (the name) of `interface` from the object at `path` on the user's session bus, to which it
-/// connects with the first post. Without a bus, posts are logged and lost. Made and destroyed on the run loop's thread;
-/// the run loop must outlive it.
+/// Returns a notifier that emits the signal "Posted" (argument: the name) of `interface` from the object at `path` on
+/// the user's session bus. Connects with the first post. Without a bus, posts are logged and dropped. Create and
+/// destroy it on the run loop's thread; the run loop must outlive it.
 [[nodiscard]] std::unique_ptr<SystemNotifier> makeSessionBusNotifier(RunLoop& runLoop, std::string path,
                                                                      std::string interface);
 
