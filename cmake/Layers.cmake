@@ -1,4 +1,4 @@
-# What every target of the house shares, and the ways to declare a layer and a program.
+# The options that all targets share, and the functions that declare a layer and a program.
 
 find_package(PkgConfig REQUIRED)
 find_package(Threads REQUIRED)
@@ -12,8 +12,8 @@ target_include_directories(house INTERFACE ${PROJECT_SOURCE_DIR})
 target_compile_options(house INTERFACE -Wall -Wextra -Wno-missing-field-initializers -Wnon-virtual-dtor
                        -Wimplicit-fallthrough $<$<NOT:$<CONFIG:Release>>:-Werror>)
 if(CMAKE_CXX_COMPILER_ID STREQUAL "GNU")
-  # g++ 12 reports false positives in optimised builds: of restrict where strings are put together, of uninitialised
-  # members in moved optionals.
+  # g++ 12 reports false positives in optimised builds: -Wrestrict for concatenated strings, -Wmaybe-uninitialized for moved
+  # optionals.
   target_compile_options(house INTERFACE -Wshadow=local -Wno-restrict -Wno-maybe-uninitialized)
 else()
   # Daily work is done with g++, which doesn't have this warning.
@@ -36,15 +36,15 @@ if(TAVRIND_FUZZ)
   target_compile_options(house INTERFACE -fsanitize=fuzzer-no-link)
 endif()
 if(CMAKE_CXX_COMPILER_ID STREQUAL "Clang")
-  # Without the time of its making, the precompiled header is the same in every tree, and ccache knows what uses it.
+  # Without a timestamp the precompiled header is the same in every tree, so that ccache can cache the sources that use it.
   target_compile_options(house INTERFACE "SHELL:-Xclang -fno-pch-timestamp")
-  # clang 19 takes std::expected from libstdc++ 12 only with concepts at their final number.
-  # libstdc++ 12 uses a function of its own that it calls deprecated, under std::stable_sort; g++ still warns of ours.
+  # clang 19 accepts libstdc++ 12's std::expected only with the final value of __cpp_concepts.
+  # libstdc++ 12 uses a function in std::stable_sort that it declares deprecated; g++ still warns about deprecated functions.
   target_compile_options(house INTERFACE -D__cpp_concepts=202002L -Wno-builtin-macro-redefined -Wno-deprecated-declarations)
 endif()
 
-# The standard headers that most sources include, compiled once for all targets: parsing them is half of the time that a
-# source takes. No header of the project is among them, so that a change compiles what includes it and nothing else.
+# The standard headers that most sources include, compiled once for all targets: parsing them takes half of the time to compile a
+# source. They contain no header of the project, so that a changed header recompiles only the sources that include it.
 add_library(house_headers OBJECT ${CMAKE_CURRENT_LIST_DIR}/precompiled.cpp)
 target_link_libraries(house_headers PRIVATE house)
 set(HOUSE_HEADERS
@@ -52,7 +52,7 @@ set(HOUSE_HEADERS
   <optional> <set> <span> <string> <string_view> <tuple> <unordered_map> <utility> <variant> <vector> <fmt/format.h>)
 target_precompile_headers(house_headers PRIVATE ${HOUSE_HEADERS})
 
-# house_library(<name> <sources>…) and house_program(<name> <sources>…): a target that is compiled as the house does.
+# house_library(<name> <sources>…) and house_program(<name> <sources>…): a target with the options of the project.
 function(house_library name)
   add_library(${name} STATIC ${ARGN})
   target_link_libraries(${name} PUBLIC house)
