@@ -8,31 +8,31 @@
 
 namespace platform {
 
-/// Where every service takes the time from.
+/// The time source of every service. Any thread.
 ///
-/// wallNow() follows the system clock and jumps with it. hostTicks() counts nanoseconds of being awake: it stops
-/// in suspend and no clock change moves it. after() counts on hostTicks(). Any thread.
+/// wallNow() is the system clock and jumps with it. hostTicks() counts nanoseconds while the device is awake: it stops
+/// in suspend, and clock changes don't move it. after() counts hostTicks().
 ///
-/// What must outlast a restart or a suspend counts in `LivedTime`.
+/// Use `LivedTime` for time that must continue across a suspend or restart.
 class Clock {
 public:
     virtual ~Clock() = default;
 
     [[nodiscard]] virtual Date wallNow() const = 0;
     [[nodiscard]] virtual std::uint64_t hostTicks() const = 0;
-    /// Nanoseconds since the device started, suspend included; no clock change moves it.
+    /// Returns the nanoseconds since the device was booted, with suspend. Clock changes don't move it.
     [[nodiscard]] virtual std::uint64_t bootTicks() const = 0;
-    /// Names that start of the device, unlike any other; empty if unknown.
+    /// Returns a unique identifier of this boot; empty if unknown.
     [[nodiscard]] virtual std::string bootId() const = 0;
 
     /// Identifies a pending timer; never 0.
     using TimerId = std::uint64_t;
 
-    /// Calls `fire` once, `delay` from now; as soon as possible if that is zero or less, but not inside this call.
-    /// `fire` runs on the clock's own thread and must only hand work on: services use `Queue::after`.
+    /// Calls `fire` once after `delay`; as soon as possible if `delay` is not positive, but never inside this call.
+    /// `fire` runs on the clock's thread and must not block: services use `Queue::after`.
     virtual TimerId after(Duration delay, std::move_only_function<void()> fire) = 0;
 
-    /// Forgets a pending timer and destroys its callback. Returns false if it has fired or is firing.
+    /// Cancels a pending timer and destroys its callback. Returns false if it has fired or is firing.
     virtual bool cancel(TimerId timer) = 0;
 };
 

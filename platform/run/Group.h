@@ -5,14 +5,14 @@
 
 namespace platform {
 
-/// Calls back once everything that entered has left.
+/// Calls back after all members have left.
 ///
 ///     platform::Group group;
 ///     for (auto& file : files) file.flush([member = group.enter()] {});
 ///     group.notify([] { done(); });
 ///
-/// A member leaves when it is destroyed, so work that is dropped leaves too. The group itself may be destroyed before
-/// its members. Any thread.
+/// A member leaves when it is destroyed, so that dropped work leaves too. The group may be destroyed before its
+/// members; the callbacks still run. Any thread.
 class Group {
 public:
     /// One piece of work inside the group.
@@ -33,7 +33,7 @@ public:
 
     Group();
     Member enter();
-    /// Calls `done` once nobody is inside: now, or on the thread on which the last member leaves.
+    /// Calls `done` once the group has no members: inside this call, or on the thread of the last member that leaves.
     void notify(std::move_only_function<void()> done);
 
 private:

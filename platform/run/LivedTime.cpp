@@ -13,10 +13,10 @@ namespace platform {
 namespace {
 
 constexpr Duration kLongestAbsence = std::chrono::hours(24 * 366);
-/// No count of ours is longer. Leaves room for every deadline.
+/// Limit of a stored count, so that no deadline overflows.
 constexpr Duration kLongestLife = std::chrono::hours(24 * 366 * 100);
 
-/// The span between two dates, of which one may come from a damaged file.
+/// Returns the time between two dates, saturated: one may come from a damaged file.
 Duration between(Date from, Date to)
 {
     Duration::rep span = 0;

@@ -11,44 +11,44 @@ namespace platform {
 
 class Clock;
 
-/// What the clocks of a device show at one moment.
+/// The values of a device's clocks at one moment.
 struct ClockReading {
     Date wall;
-    std::uint64_t bootTicks = 0; ///< nanoseconds since the device started, suspend included
-    std::string boot;            ///< names that start; empty if unknown
+    std::uint64_t bootTicks = 0; ///< nanoseconds since the device was booted, with suspend
+    std::string boot;            ///< identifier of that boot; empty if unknown
 
     bool operator==(const ClockReading&) const = default;
 };
 
-/// Returns how much time has passed between two readings.
+/// Returns the time that passed between two readings; never negative. Any thread.
 ///
-/// Within one start of the device that is what the boot ticks say, whatever the system clock does. Over a restart it is
-/// the difference of the system clock, if that is at least the time since the restart and at most a year more; else the
-/// clock was set, and the time since the restart is all that is known.
+/// Within one boot that is the difference of the boot ticks, whatever the system clock does. Across a reboot it is the
+/// difference of the system clock, if that is at least the time since the reboot and at most a year more. Otherwise the
+/// clock was set, and the result is the time since the reboot.
 [[nodiscard]] Duration timePassed(const ClockReading& from, const ClockReading& to);
 
-/// A count of time for deadlines and due times that are kept on disk: it goes on through suspend and while no process
-/// runs, ignores leaps of the system clock, and never goes back. One thread at a time; the clock must outlive it.
+/// A count of time for deadlines and due times on disk. It continues in suspend and while no process runs, ignores
+/// changes of the system clock, and never decreases. One thread at a time; the clock must outlive it.
 class LivedTime {
 public:
-    /// What is kept on disk: a count, and the clocks at that moment.
+    /// The stored form: a count, and the clocks at that moment.
     struct Mark {
         Duration lived{};
         ClockReading clock;
 
         bool operator==(const Mark&) const = default;
-        /// "LIVED WALL BOOTTICKS BOOT": nanoseconds, since 1970 for the system clock.
+        /// Returns "LIVED WALL BOOTTICKS BOOT": three counts of nanoseconds (WALL since 1970) and the boot identifier.
         [[nodiscard]] std::string text() const;
-        /// Returns nothing for anything that `text` didn't make.
+        /// Parses what `text` returned; returns nothing for other texts.
         [[nodiscard]] static std::optional<Mark> parse(std::string_view text);
     };
 
-    /// Continues from `saved`, or begins at 0.
+    /// Continues from `saved`, or starts at 0.
     explicit LivedTime(Clock& clock, std::optional<Mark> saved = std::nullopt);
 
     /// Returns the count.
     [[nodiscard]] Duration now();
-    /// Returns the count and the clocks, to be saved.
+    /// Returns the count and the clocks, for saving.
     [[nodiscard]] Mark mark();
 
 private:

@@ -9,13 +9,13 @@
 
 namespace platform {
 
-/// Something that happened, by name.
+/// A named event.
 struct Notification {
     std::string name;
     const void* object = nullptr; ///< the sender; compared only, never dereferenced
     std::map<std::string, std::any, std::less<>> userInfo;
 
-    /// Returns the entry under `key` if it is exactly a `T`, else a default `T` (null for pointers).
+    /// Returns the entry under `key` if it is exactly a `T`, otherwise a default `T` (null for pointers).
     template <class T> [[nodiscard]] T get(std::string_view key) const
     {
         auto found = userInfo.find(key);
@@ -27,9 +27,9 @@ struct Notification {
 
 /// In-process notifications. Any thread.
 ///
-/// `post` calls the observers on the posting thread, in the order of their registration, from a snapshot and without
-/// holding a lock: observers may register, unregister and post. Once a token's destructor has returned, its callback is
-/// neither running on another thread nor called again. A token may be destroyed inside its own callback.
+/// `post` calls the observers on the posting thread, in the order of their registration, from a snapshot and without a
+/// lock: observers may register, unregister and post. After a token's destructor has returned, its callback neither
+/// runs on another thread nor is called again. A token may be destroyed inside its own callback.
 class NotificationCenter {
 public:
     using Callback = std::function<void(const Notification&)>;
@@ -52,11 +52,11 @@ public:
     NotificationCenter();
     ~NotificationCenter();
 
-    /// Calls `callback` for every notification `name`; only for those of `sender` unless that is null. The token may
-    /// outlive the centre.
+    /// Calls `callback` for every notification `name`; if `sender` is not null, only for those with that object. The
+    /// token may outlive the centre.
     [[nodiscard]] Token observe(std::string_view name, Callback callback, const void* sender = nullptr);
 
-    /// Returns when all observers have been called.
+    /// Returns after all observers have been called.
     void post(const Notification& notification) const;
 
 private:

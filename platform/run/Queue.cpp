@@ -18,12 +18,12 @@ namespace platform {
 
 namespace {
 
-/// Tasks that one drain job runs before it gives its worker back.
+/// Tasks that one drain job runs before it releases its worker.
 constexpr unsigned kBatch = 32;
-/// Drain jobs that one concurrent queue has with the executor at a time.
+/// Limit of the drain jobs that one concurrent queue has pending on the executor.
 constexpr std::size_t kMaximumJobs = 64;
 
-/// The queues whose tasks this thread is in, innermost first.
+/// The queues whose tasks this thread runs, innermost first.
 struct Frame {
     explicit Frame(Queue* queue_) : queue(queue_), outer(top) { top = this; }
     ~Frame() { top = outer; }
@@ -41,8 +41,8 @@ thread_local Frame* Frame::top = nullptr;
 
 } // namespace
 
-/// A queue that is held back, by the event that it waits for and by a timer; whichever comes first lets it go on. The
-/// timer owns it, so that an event that never happens holds nothing.
+/// A suspended queue. The event or the timer resumes it, whichever comes first. The timer owns the suspension, so that
+/// an event that is never signalled keeps nothing alive.
 struct Suspension {
     std::shared_ptr<Queue> queue;
     Queue::Task continuation;

@@ -13,7 +13,7 @@ namespace platform {
 
 class Clock;
 
-/// Something that happens once, for which several queues may wait (`Queue::suspendUntil`). Any thread.
+/// A condition that becomes true once, for which several queues may wait (`Queue::suspendUntil`). Any thread.
 class Event {
 public:
     Event();
@@ -21,7 +21,7 @@ public:
     Event(const Event&) = delete;
     Event& operator=(const Event&) = delete;
 
-    /// Wakes all who wait; from now on nobody waits. Further calls do nothing.
+    /// Resumes all suspended queues; later waits end at once. Further calls do nothing.
     void signal();
     [[nodiscard]] bool signalled() const;
 
@@ -31,11 +31,11 @@ private:
     std::shared_ptr<State> _state;
 };
 
-/// Guards state: whatever only tasks of one queue touch needs no lock.
+/// Guards state: data that only tasks of one queue use needs no lock.
 ///
 /// A serial queue runs its tasks one at a time, in the order of the calls. A concurrent queue runs shared tasks
-/// (`async`, `sync`) side by side and barrier tasks (`barrierAsync`, `barrierSync`) alone, after all earlier and before
-/// all later tasks. On a serial queue the barrier calls are the plain ones.
+/// (`async`, `sync`) in parallel and barrier tasks (`barrierAsync`, `barrierSync`) alone, after all earlier and before
+/// all later tasks. On a serial queue the barrier calls equal the plain ones.
 ///
 /// `sync` on an idle queue runs inline on the caller's thread. If tasks are waiting and no thread drains them, the
 /// caller drains up to its own turn and no further, so that it never depends on a free worker. `sync` on a queue that
@@ -62,17 +62,17 @@ public:
     void async(Task task);
     void barrierAsync(Task task);
 
-    /// Returns what `function` returns, once its turn has come and it has run.
+    /// Blocks until `function` has run in its turn, and returns its result.
     template <class F> auto sync(F&& function) { return runNow(std::forward<F>(function), false); }
     template <class F> auto barrierSync(F&& function) { return runNow(std::forward<F>(function), true); }
 
-    /// Appends the task once `delay` has passed, counted on the clock's hostTicks(). The timer keeps the queue alive.
+    /// Appends the task after `delay`, which counts the clock's hostTicks(). The timer keeps the queue alive.
     void after(Duration delay, Task task);
 
-    /// To be called from a task of this queue, which must be serial. Once that task has returned, holds back all later
-    /// tasks until `event` has happened or `timeout` has passed, then runs `continuation` before them; if the event has
-    /// happened already, at once. The continuation may call suspendUntil again. If one task calls it several times, the
-    /// continuations run in the order of the calls, when all of them may.
+    /// Suspends this serial queue after the current task, which must be the caller, until `event` is signalled or
+    /// `timeout` has passed; then runs `continuation` before all later tasks. Doesn't suspend if the event is signalled
+    /// already. The continuation may call suspendUntil again. If one task calls it several times, the queue resumes
+    /// after all of them, and the continuations run in the order of the calls.
     void suspendUntil(const Event& event, Duration timeout, Task continuation);
 
     /// Returns the innermost queue of which this thread runs a task, or null.
@@ -82,7 +82,7 @@ public:
     /// Aborts with the label unless this thread runs a task of this queue.
     void assertOnQueue() const;
 
-    /// A reference to a callable that lives as long as the call.
+    /// A reference to a callable, which must outlive it.
     class TaskRef {
     public:
         template <class F>

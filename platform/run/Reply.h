@@ -6,15 +6,15 @@
 namespace platform {
 
 namespace detail {
-/// Reports a reply that was dropped, or answered twice. Aborts under test (`failOnReplyMisuse`), logs otherwise.
+/// Reports a reply that was dropped, or called twice. Aborts in tests (`failOnReplyMisuse`), logs a fault otherwise.
 void replyMisused(const char* what);
 } // namespace detail
 
-/// From now on a forgotten or repeated answer aborts the process. Tests call it first thing.
+/// Makes `replyMisused` abort the process from now on. Tests call it at their start.
 void failOnReplyMisuse();
 
-/// The one answer to a call: a move-only callback that is called once, or given up with `abandon()` if the call gets no
-/// answer. Dropping a reply without either is a programming error: the caller would wait for ever.
+/// The reply to one call: a move-only callback that must be called once, or abandoned with `abandon()` if the call gets
+/// no reply. Dropping it without either is a programming error: the caller would wait for ever.
 ///
 /// Any thread, one at a time.
 template <class... Args> class Reply {
@@ -22,8 +22,8 @@ public:
     using Function = std::move_only_function<void(Args...)>;
 
     Reply() = default;
-    /// `answer` is called with the reply. `abandoned`, if given, is called instead if the reply is abandoned or
-    /// dropped, so that whoever keeps a slot for it can free it.
+    /// The call operator calls `answer`. If the reply is abandoned or dropped, `abandoned` is called instead, so that
+    /// the owner of a pending call can free it.
     explicit Reply(Function answer, std::move_only_function<void()> abandoned = {})
         : _answer(std::move(answer)), _abandoned(std::move(abandoned))
     {}
@@ -41,7 +41,7 @@ public:
     }
     ~Reply() { drop(); }
 
-    /// True while an answer is owed.
+    /// Returns true until the reply is called, abandoned or moved from.
     explicit operator bool() const { return static_cast<bool>(_answer); }
 
     void operator()(Args... args)
@@ -51,8 +51,8 @@ public:
         std::exchange(_answer, {})(std::forward<Args>(args)...);
     }
 
-    /// This reply with `then` after its answer; `then` is not called if the reply is abandoned. Leaves this reply
-    /// empty.
+    /// Returns a reply that calls this one and then `then`; `then` is not called if the reply is abandoned. Leaves this
+    /// reply empty.
     [[nodiscard]] Reply andThen(std::move_only_function<void()> then) &&
     {
         Reply result;
@@ -65,7 +65,7 @@ public:
         return result;
     }
 
-    /// Gives the answer up: the caller gets none.
+    /// Ends the call without a reply.
     void abandon()
     {
         _answer = {};

@@ -11,9 +11,9 @@ namespace platform {
 
 /// The main thread's event loop, on sd-event: descriptors, signals, and jobs from other threads.
 ///
-/// The loop's thread is the one that calls `run` or `runOnce`. Everything belongs to it, callbacks included, except
-/// `execute` and `stop`, which any thread may call. Nothing on it may block. An idle loop sleeps in the kernel: it has
-/// no tick. Aborts if the process can have no epoll descriptor.
+/// The loop's thread is the one that calls `run` or `runOnce`. All functions and callbacks are confined to it, except
+/// `execute` and `stop`, which any thread may call. Callbacks must not block. An idle loop sleeps in the kernel,
+/// without a tick. The constructor aborts if it can't create an epoll descriptor.
 class RunLoop final : public Executor {
 public:
     RunLoop();
@@ -21,7 +21,7 @@ public:
 
     /// Returns after `stop()`.
     void run();
-    /// Dispatches what is ready, and waits at most `timeout` if nothing is. For tests and tools.
+    /// Dispatches ready events; if there are none, waits at most `timeout` for one. For tests and tools.
     void runOnce(Duration timeout);
     void stop();
 
@@ -31,21 +31,21 @@ public:
     /// Calls `handler` for every such signal, which must be blocked in all threads (`blockSignals`).
     void onSignal(int signal, std::move_only_function<void()> handler);
 
-    /// A watched descriptor. Its destructor ends the watch; the descriptor stays the caller's.
+    /// A watched descriptor. Its destructor ends the watch; the caller owns the descriptor.
     class Watch {
     public:
         virtual ~Watch() = default;
         /// Sets the events (EPOLLIN, EPOLLOUT …) to wait for; 0 pauses the watch.
         virtual void setEvents(std::uint32_t events) = 0;
     };
-    /// Calls `ready` with the events seen on `fd`, level-triggered. `fd` must stay open as long as the watch.
+    /// Calls `ready` with the events of `fd`, level-triggered. `fd` must stay open as long as the watch exists.
     [[nodiscard]] std::unique_ptr<Watch> watch(int fd, std::uint32_t events, std::function<void(std::uint32_t)> ready);
 
-    /// The loop itself, for libraries that can share it. Owned by this object.
+    /// Returns the sd-event loop, for libraries that can share it. This object owns it.
     [[nodiscard]] sd_event* handle() const;
 
-    /// Blocks SIGINT and SIGTERM for this thread and all threads made from it, and ignores SIGPIPE: writing to a closed
-    /// peer is an error like any other. To be called before the first thread is made.
+    /// Blocks SIGINT and SIGTERM for this thread and all threads that it starts, and ignores SIGPIPE, so that writing
+    /// to a closed peer fails with EPIPE. Call it before the first thread starts.
     static void blockSignals();
 
 private:

@@ -8,8 +8,8 @@ namespace platform {
 
 class RunLoop;
 
-/// Makes the device's clock. Its timers fire on the run loop's thread and share one timer descriptor: the process
-/// doesn't wake while none is due. Destroyed on the run loop's thread; the run loop must outlive it.
+/// Returns the device's clock. Its timers fire on the run loop's thread and share one timer descriptor: the process
+/// wakes only when one is due. Destroy it on the run loop's thread; the run loop must outlive it.
 [[nodiscard]] std::unique_ptr<Clock> makeSystemClock(RunLoop& runLoop);
 
 } // namespace platform

@@ -22,9 +22,9 @@ public:
     };
 
     Transactions();
-    /// Opens a transaction; several may have one name.
+    /// Opens a transaction; several may have the same name.
     Token begin(std::string name);
-    /// Returns how many transactions are open, by name. Names without any are absent.
+    /// Returns the number of open transactions by name, without zeros.
     [[nodiscard]] std::map<std::string, int> open() const;
 
 private:

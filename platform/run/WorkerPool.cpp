@@ -16,8 +16,8 @@ namespace platform {
 
 namespace {
 
-/// A counting semaphore. Unlike a condition variable it costs the waker no second system call, and unlike the standard
-/// library's semaphore it never spins.
+/// A counting semaphore. Unlike a condition variable it needs no second system call to wake a thread, and unlike the
+/// standard library's semaphore it never spins.
 class Tokens {
 public:
     Tokens() { sem_init(&_semaphore, 0, 0); }

@@ -6,13 +6,13 @@
 
 namespace platform {
 
-/// Threads that run jobs. A thread is made if a job finds no idle one, up to the limit, and is kept.
+/// Threads that run jobs. A job that finds no idle thread starts one, up to the limit; threads are kept.
 ///
 /// Default and high-priority jobs share `size` threads; high-priority jobs overtake waiting ones. Background jobs share
 /// one thread of lower CPU priority.
 class WorkerPool final : public Executor {
 public:
-    /// 0 means as many threads as there are cores, but at least 2.
+    /// 0 selects the number of cores, but at least 2.
     explicit WorkerPool(unsigned size = 0);
     /// Waits for running jobs, destroys the others without running them, and joins the threads.
     ~WorkerPool() override;
