@@ -70,9 +70,9 @@ public:
     void after(Duration delay, Task task);
 
     /// Suspends this serial queue after the current task, which must be the caller, until `event` is signalled or
-    /// `timeout` has passed; then runs `continuation` before all later tasks. Doesn't suspend if the event is signalled
-    /// already. The continuation may call suspendUntil again. If one task calls it several times, the queue resumes
-    /// after all of them, and the continuations run in the order of the calls.
+    /// `timeout` has passed; then runs `continuation` before all later tasks. If the event is signalled already, the
+    /// continuation runs right after the current task. The continuation may call suspendUntil again. If one task calls
+    /// it several times, the queue resumes after all of them, and the continuations run in the order of the calls.
     void suspendUntil(const Event& event, Duration timeout, Task continuation);
 
     /// Returns the innermost queue of which this thread runs a task, or null.

@@ -41,7 +41,7 @@ public:
     }
     ~Reply() { drop(); }
 
-    /// Returns true until the reply is called, abandoned or moved from.
+    /// Returns true if the reply must still be called or abandoned.
     explicit operator bool() const { return static_cast<bool>(_answer); }
 
     void operator()(Args... args)
