@@ -25,16 +25,11 @@ namespace {
 constexpr const char* kSignatureKey = "TAVAppWhitelistSignature";
 constexpr std::size_t kMaximumWhitelistSize = 32u << 20;
 
-const platform::Log& log()
-{
-    return TavrinLogForCategory(kLogGeneral);
-}
-
 std::optional<JsonDocument> parsed(std::string_view json)
 {
     auto document = JsonDocument::parse(json, kMaximumWhitelistSize);
     if (document) return std::move(*document);
-    log().error("app whitelist is broken: {}", document.error().description());
+    log(kLogGeneral).error("app whitelist is broken: {}", document.error().description());
     return std::nullopt;
 }
 
@@ -57,8 +52,9 @@ std::optional<std::uint32_t> encodingId(std::string_view identifier, const Value
     if (!number.isNumber()) return std::nullopt;
     const auto id = number.asInt();
     if (!id || *id < 0 || *id > kMaximumEncodingId) {
-        log().error("encoding id {} of {} is not a whole number from 0 to {}", platform::toJson(number), identifier,
-                    kMaximumEncodingId);
+        log(kLogGeneral)
+            .error("encoding id {} of {} is not a whole number from 0 to {}", platform::toJson(number), identifier,
+                   kMaximumEncodingId);
         return std::nullopt;
     }
     return static_cast<std::uint32_t>(*id);
@@ -88,7 +84,7 @@ std::optional<std::string> processWhitelist(std::string_view whitelist, platform
     const std::string bitmap = bitmapOf(ids);
     const std::string_view version = *list->textOf("version");
     auto signature = makeSignature(static_cast<std::uint16_t>(bitmap.size()), rle_compress(bitmap), version);
-    if (!signature) log().error("app whitelist version is not hexadecimal: {}", version);
+    if (!signature) log(kLogGeneral).error("app whitelist version is not hexadecimal: {}", version);
     return signature;
 }
 
@@ -130,19 +126,19 @@ void AppWhitelistController::_generateWhitelistSignature()
 
 std::optional<std::string> AppWhitelistController::_generate()
 {
-    log().debug("generating app whitelist");
+    log(kLogGeneral).debug("generating app whitelist");
     const auto resource = _assembly.downloadManager->fileHandleForResource(std::string(kTAVInstalledAppWhitelist));
     if (!resource) {
-        log().error("error reading app whitelist {}", resource.error().description());
+        log(kLogGeneral).error("error reading app whitelist {}", resource.error().description());
         return std::nullopt;
     }
     const auto whitelist = mmapFileHandle(resource->file);
     if (!whitelist) {
-        log().error("mmap failed {}", whitelist.error().description());
+        log(kLogGeneral).error("mmap failed {}", whitelist.error().description());
         return std::nullopt;
     }
     auto signature = processWhitelist(whitelist->view(), _assembly.device.applications);
-    log().debug("installed app signature: {}", signature.value_or("none"));
+    log(kLogGeneral).debug("installed app signature: {}", signature.value_or("none"));
     return signature;
 }
 

@@ -23,7 +23,7 @@ std::optional<std::string_view> ArchivedDataIterator::readNextObject()
 {
     const auto archive = _next();
     if (archive) return *archive;
-    TavrinLogForCategory(kLogFeedbackStorage).error("{}", archive.error());
+    log(kLogFeedbackStorage).error("{}", archive.error());
     return std::nullopt;
 }
 

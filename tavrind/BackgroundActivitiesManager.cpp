@@ -30,11 +30,6 @@ constexpr std::chrono::seconds kGracePeriod = 300s;
 /// Age at which the file of a body counts as abandoned: no body takes that long to write.
 constexpr std::chrono::hours kOldBody(1);
 
-const platform::Log& log()
-{
-    return TavrinLogForCategory(kLogFlusher);
-}
-
 platform::ActivityCriteria criteria()
 {
     platform::ActivityCriteria criteria = TavrinXPCCriteria::createCriteria();
@@ -51,7 +46,8 @@ void setState(ActivityState state, platform::Activity& activity)
 {
     const ActivityState current = TavrinXPCActivity::getStateForActivity(activity);
     if (!TavrinXPCActivity::setState(state, activity))
-        log().fault("State transition from {} to {} invalid", static_cast<int>(current), static_cast<int>(state));
+        log(kLogFlusher)
+            .fault("State transition from {} to {} invalid", static_cast<int>(current), static_cast<int>(state));
 }
 
 } // namespace
@@ -64,8 +60,9 @@ std::shared_ptr<BackgroundActivitiesManager> BackgroundActivitiesManager::make(A
         [weak = manager->weak_from_this()](const std::shared_ptr<platform::Activity>& activity) {
             if (auto self = weak.lock()) self->_runActivity(activity);
         });
-    log().log("started flush to wire in the background {} with interval {:f} seconds", kActivity,
-              static_cast<double>(kInterval.count()));
+    log(kLogFlusher)
+        .log("started flush to wire in the background {} with interval {:f} seconds", kActivity,
+             static_cast<double>(kInterval.count()));
     return manager;
 }
 
@@ -85,11 +82,11 @@ void BackgroundActivitiesManager::_runActivity(const std::shared_ptr<platform::A
     if (TavrinXPCActivity::getStateForActivity(*activity) != ActivityState::Run)
         return; // a check-in keeps the criteria of the registration
     if (_stopFlushing) {
-        log().log("flushing has been stopped, will start again with dump command");
+        log(kLogFlusher).log("flushing has been stopped, will start again with dump command");
         setState(ActivityState::Done, *activity);
         return;
     }
-    log().log("scheduled flush feedbacks to wire {}", kActivity);
+    log(kLogFlusher).log("scheduled flush feedbacks to wire {}", kActivity);
     setState(ActivityState::Continue, *activity);
     auto transaction = _assembly.device.transactions.begin(kActivity);
     _queueFlusher->async([self = shared_from_this(), activity, transaction = std::move(transaction)] {
@@ -136,7 +133,8 @@ void BackgroundActivitiesManager::_sweepBodies()
         if (!name.starts_with(kUploadBodyPrefix)) continue;
         const auto info = _assembly.fileManager.info(directory / name);
         if (!info || info->kind != platform::FileInfo::Kind::File || info->modified > oldest) continue;
-        if (_assembly.fileManager.remove(directory / name)) log().log("removed the unfinished upload body {}", name);
+        if (_assembly.fileManager.remove(directory / name))
+            log(kLogFlusher).log("removed the unfinished upload body {}", name);
     }
 }
 
@@ -169,15 +167,16 @@ void BackgroundActivitiesManager::taskDidSendBodyData(const std::shared_ptr<plat
                                                       std::uint64_t sent, std::uint64_t expected)
 {
     const float percent = expected == 0 ? 100.0F : 100.0F * static_cast<float>(sent) / static_cast<float>(expected);
-    log().debug("data transfer {:f} of {:f}", percent, static_cast<float>(expected));
+    log(kLogFlusher).debug("data transfer {:f} of {:f}", percent, static_cast<float>(expected));
 }
 
 void BackgroundActivitiesManager::taskDidComplete(const std::shared_ptr<platform::BackgroundTask>& task,
                                                   const std::optional<platform::UrlResponse>& response,
                                                   const std::optional<platform::Error>& error)
 {
-    log().log("URLSession:task:didCompleteWithError: id={}, error={}", task->identifier(),
-              error ? error->description() : "none");
+    log(kLogFlusher)
+        .log("URLSession:task:didCompleteWithError: id={}, error={}", task->identifier(),
+             error ? error->description() : "none");
     const UploadNote note = UploadNote::from(task->note());
     const std::string upload = note.process + '/' + std::to_string(task->identifier());
     if (_assembly.feedbackBooks.isSettled(upload)) return;
@@ -192,7 +191,7 @@ void BackgroundActivitiesManager::taskDidComplete(const std::shared_ptr<platform
     if (sent) {
         _assembly.diagnosticData.addValue(count, "com.quorvane.tavrind.feedbacksent");
     } else {
-        log().fault("response error {}", response ? std::to_string(response->statusCode) : "none");
+        log(kLogFlusher).fault("response error {}", response ? std::to_string(response->statusCode) : "none");
         _assembly.diagnosticData.addValue(count, "com.quorvane.tavrind.feedbacknotsent");
     }
     // The upload session forgets the task when this function returns, so the counts must be on disk before that.
@@ -202,12 +201,12 @@ void BackgroundActivitiesManager::taskDidComplete(const std::shared_ptr<platform
 
 void BackgroundActivitiesManager::sessionDidFinishEvents()
 {
-    log().log("URLSessionDidFinishEventsForBackgroundURLSession called");
+    log(kLogFlusher).log("URLSessionDidFinishEventsForBackgroundURLSession called");
 }
 
 void BackgroundActivitiesManager::sessionDidBecomeInvalid(const platform::Error& error)
 {
-    log().error("Session became invalid with error {}", error.description());
+    log(kLogFlusher).error("Session became invalid with error {}", error.description());
 }
 
 } // namespace tavrin

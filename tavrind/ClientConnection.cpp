@@ -72,7 +72,7 @@ std::optional<std::string> ClientConnection::clientShortName() const
 
 void ClientConnection::_ensureState()
 {
-    const platform::Log& log = TavrinLogForCategory(kLogSession);
+    const platform::Log& log = tavrin::log(kLogSession);
     if (!_configuration) return log.fault("configuration must not be nil");
     if (!_configuration->identifier || !_configuration->userAgent)
         return log.fault("configuration requires identifier and agent");
@@ -90,7 +90,7 @@ void ClientConnection::_ensureState()
 void ClientConnection::configure(std::shared_ptr<TAVSessionConfiguration> configuration,
                                  platform::Reply<std::string> reply)
 {
-    TavrinLogForCategory(kLogConnection)
+    log(kLogConnection)
         .log("client configuration {}", configuration ? platform::toJson(platform::toValue(*configuration)) : "none");
     {
         std::lock_guard lock(_mutex);
@@ -100,7 +100,7 @@ void ClientConnection::configure(std::shared_ptr<TAVSessionConfiguration> config
     if (!_state) {
         ClientSessionManager::reportErrorAsTavrindFeedback(
             makeTAVError(TAVErrorInvalidResponse, "invalid configuration"), _assembly);
-        TavrinLogForCategory(kLogSession).fault("invalid configuration, closing connection");
+        log(kLogSession).fault("invalid configuration, closing connection");
         _connection->invalidate();
         return reply.abandon();
     }
@@ -112,11 +112,9 @@ void ClientConnection::configure(std::shared_ptr<TAVSessionConfiguration> config
             auto self = weak.lock();
             if (!self) return;
             if (bag && !bag->feedbackEnabled())
-                TavrinLogForCategory(kLogFeedback)
-                    .info("feedback collection disabled in bag for user agent {}", userAgent);
-            TavrinLogForCategory(kLogBag).info("sending bag with version: {} to client: {} error: {}",
-                                               bag ? bag->version() : "none", userAgent,
-                                               error ? error->description() : "none");
+                log(kLogFeedback).info("feedback collection disabled in bag for user agent {}", userAgent);
+            log(kLogBag).info("sending bag with version: {} to client: {} error: {}", bag ? bag->version() : "none",
+                              userAgent, error ? error->description() : "none");
             self->_remoteObject->bagDidLoad(bag, error);
             self->_bagObserver = self->_assembly.notificationCenter.observe(
                 TAVBagChangeNotification, [weak](const platform::Notification& notification) {
@@ -135,7 +133,7 @@ void ClientConnection::configure(std::shared_ptr<TAVSessionConfiguration> config
 /// Called inside the bag controller's barrier, so the push is queued on the connection's queue.
 void ClientConnection::bagChangeNotification(std::shared_ptr<const TAVBag> bag)
 {
-    TavrinLogForCategory(kLogBag).info("bag change notification: {}", bag ? bag->version() : "none");
+    log(kLogBag).info("bag change notification: {}", bag ? bag->version() : "none");
     if (!bag) return;
     _connection->queue()->async([weak = weak_from_this(), bag = std::move(bag)] {
         if (auto self = weak.lock()) self->_remoteObject->bagDidLoad(bag, {});
@@ -151,7 +149,7 @@ void ClientConnection::bag(BagReply reply)
 
 void ClientConnection::_completeDefaults(TAVRequest& request) const
 {
-    const platform::Log& log = TavrinLogForCategory(kLogRequest);
+    const platform::Log& log = tavrin::log(kLogRequest);
     if (request.keyboardInputMode.value_or("").empty()) {
         std::string mode = _assembly.device.locale.keyboardInputMode();
         if (mode.empty()) mode = _assembly.device.locale.defaultInputMode();
@@ -218,14 +216,14 @@ void ClientConnection::reportEvent(const std::string&, std::int64_t queryId, std
 void ClientConnection::reportEvent(std::shared_ptr<ZRFeedback> feedback, std::int64_t queryId,
                                    std::shared_ptr<void> call)
 {
-    const platform::Log& log = TavrinLogForCategory(kLogFeedback);
+    const platform::Log& log = tavrin::log(kLogFeedback);
     if (!_state) {
         if (!_reportedNoState.exchange(true)) _reportOneOff(makeTAVError(TAVErrorInvalidResponse, "client state nil"));
         return log.error("state must not be nil");
     }
     if (auto custom = std::dynamic_pointer_cast<ZRCustomFeedback>(feedback)) {
         return handleCustomFeedback(std::move(custom), queryId,
-                                    [] { TavrinLogForCategory(kLogFlusher).log("flushed custom feedback"); });
+                                    [] { log(kLogFlusher).log("flushed custom feedback"); });
     }
     if (const auto* appear = dynamic_cast<const ZRSearchViewAppearFeedback*>(feedback.get())) {
         if (!appear->isOnLockScreen &&
@@ -265,7 +263,7 @@ void ClientConnection::handleCustomFeedback(std::shared_ptr<ZRCustomFeedback> fe
         _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.dp.submit");
         return _assembly.crowdsourcingFeedbackFlusher->flush(std::move(feedback), std::move(callback));
     default:
-        TavrinLogForCategory(kLogFeedback)
+        log(kLogFeedback)
             .info("custom feedback of type {} is not served", static_cast<std::int64_t>(feedback->feedbackType));
     }
 }
@@ -304,7 +302,7 @@ void ClientConnection::fileHandleAndAttributesForResource(const std::string& res
         if (found) return reply(std::move(found->file), std::move(found->attributes), {});
         reply({}, {}, std::move(found.error()));
     } catch (const std::exception& exception) { // out of memory, or a fault of a library
-        TavrinLogForCategory(kLogConnection).fault("identifier: {} exception: {}", resource, exception.what());
+        log(kLogConnection).fault("identifier: {} exception: {}", resource, exception.what());
         if (reply) reply({}, {}, makeTAVError(TAVErrorInvalidResponse, exception.what()));
     }
 }

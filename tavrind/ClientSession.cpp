@@ -102,7 +102,7 @@ bool ClientSession::_updateFirstUseDate()
 {
     const auto key = firstUseKey(_header.agent);
     if (!key) {
-        TavrinLogForCategory(kLogSession).info("user default key not found for agent: {}", _header.agent);
+        log(kLogSession).info("user default key not found for agent: {}", _header.agent);
         return false;
     }
     _assembly.userDefaults.set(*key, *_header.baseTime);
@@ -114,7 +114,7 @@ bool ClientSession::_updateFirstUseDate()
 
 void ClientSession::addFeedback(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call)
 {
-    if (!feedback) return TavrinLogForCategory(kLogSession).error("attempted to add a nil feedback");
+    if (!feedback) return log(kLogSession).error("attempted to add a nil feedback");
     const bool otherUser = !_header.userGuid.isNil() && feedback->userGuid != _header.userGuid.string();
     const std::string agent = feedback->userAgent;
     _write(std::move(feedback), std::move(call));
@@ -142,7 +142,7 @@ void ClientSession::_write(std::shared_ptr<TavrinFeedback> feedback, std::shared
 void ClientSession::sessionComplete()
 {
     _sessionQueue->sync([this] {
-        if (!_storageHandle) return TavrinLogForCategory(kLogSession).fault("Storage Handle nil major error");
+        if (!_storageHandle) return log(kLogSession).fault("Storage Handle nil major error");
         _assembly.persistentStorage->closeSessionWithFileContainer(_storageHandle);
     });
 }

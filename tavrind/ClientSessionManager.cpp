@@ -32,11 +32,6 @@ constexpr platform::Duration kSoftLimit = 10min;
 constexpr platform::Duration kFromSoftLimitToMaxTime = 5min;
 constexpr std::chrono::seconds kIdleTime = 180s;
 
-const platform::Log& log()
-{
-    return TavrinLogForCategory(kLogSession);
-}
-
 } // namespace
 
 /// The arguments of an event of the state machine.
@@ -81,9 +76,9 @@ ClientSessionManager::ClientSessionManager(Assembly& assembly, std::shared_ptr<T
       _sessionQueue(assembly.device.serialQueue("com.quorvane.tavrind.clientSessionManagerQueue"))
 {
     if (assembly.sharedSession)
-        log().log("Tavrin is using shared session for all clients {}", _identifier);
+        log(kLogSession).log("Tavrin is using shared session for all clients {}", _identifier);
     else
-        log().log("Tavrin is using individual session for clients {}", _identifier);
+        log(kLogSession).log("Tavrin is using individual session for clients {}", _identifier);
 }
 
 ClientSessionManager::~ClientSessionManager() = default;
@@ -133,9 +128,9 @@ void ClientSessionManager::_updateState(SessionEvent event, Occasion occasion)
         return;
     }
     if (!known)
-        log().debug("External event received {}", static_cast<unsigned>(event));
+        log(kLogSession).debug("External event received {}", static_cast<unsigned>(event));
     else if (event == SessionEvent::AddFeedback)
-        log().log("Avoided adding feedback in state {}", static_cast<unsigned>(_currentState));
+        log(kLogSession).log("Avoided adding feedback in state {}", static_cast<unsigned>(_currentState));
 }
 
 void ClientSessionManager::_nothing(Occasion&) {}
@@ -152,8 +147,9 @@ void ClientSessionManager::_begin(Occasion& occasion)
 
 void ClientSessionManager::_endMaxTime(Occasion&)
 {
-    _flushSessionWithReason(SessionEndReason::MaxSessionTime,
-                            [this] { log().log("session flushed because max timer expired {}", _identifier); });
+    _flushSessionWithReason(SessionEndReason::MaxSessionTime, [this] {
+        log(kLogSession).log("session flushed because max timer expired {}", _identifier);
+    });
 }
 
 void ClientSessionManager::_endExternal(Occasion& occasion)
@@ -169,15 +165,16 @@ void ClientSessionManager::_requestFlush(Occasion&)
 void ClientSessionManager::_endCriticalMemory(Occasion& occasion)
 {
     _flushSessionWithReason(SessionEndReason::CriticalMemory,
-                            [] { log().log("session flushed because of critical memory"); });
+                            [] { log(kLogSession).log("session flushed because of critical memory"); });
     _requestFlush(occasion);
 }
 
 void ClientSessionManager::_endIdleAndBegin(Occasion& occasion)
 {
     _flushSessionWithReason(SessionEndReason::SessionIdle, [this] {
-        log().log("session flushed because soft limit reached and idle time was beyond {} {}", kIdleTime.count(),
-                  _identifier);
+        log(kLogSession)
+            .log("session flushed because soft limit reached and idle time was beyond {} {}", kIdleTime.count(),
+                 _identifier);
     });
     _guidController->reset();
     occasion.feedback->userGuid = _guidController->currentUserGUID().string();
@@ -187,7 +184,7 @@ void ClientSessionManager::_endIdleAndBegin(Occasion& occasion)
 void ClientSessionManager::_endGuidChangedAndBegin(Occasion& occasion)
 {
     _flushSessionWithReason(SessionEndReason::GuidChanged,
-                            [this] { log().log("session flushed because guid changed {}", _identifier); });
+                            [this] { log(kLogSession).log("session flushed because guid changed {}", _identifier); });
     _setNewSession(occasion);
 }
 
@@ -195,7 +192,7 @@ void ClientSessionManager::_endEngagement(Occasion& occasion)
 {
     _session->addFeedback(std::move(occasion.feedback), std::move(occasion.call));
     _flushSessionWithReason(SessionEndReason::EngagementReceived, [] {
-        log().log("session flushed because soft limit reached and sentinel feedback received");
+        log(kLogSession).log("session flushed because soft limit reached and sentinel feedback received");
     });
     _guidController->reset();
 }
@@ -210,12 +207,13 @@ void ClientSessionManager::_setNewSession(Occasion& occasion)
     else
         _session = std::make_shared<ClientSession>(_assembly, std::move(occasion.feedback), previousReason,
                                                    std::move(occasion.call));
-    log().log("new session id {} {}", counter, _identifier);
+    log(kLogSession).log("new session id {} {}", counter, _identifier);
 
     _sessionQueue->after(kSoftLimit, [weak = weak_from_this(), counter] {
         const auto self = weak.lock();
         if (!self) return;
-        log().debug("soft limit reached expected {} current {} {}", counter, self->_sessionCounter, self->_identifier);
+        log(kLogSession)
+            .debug("soft limit reached expected {} current {} {}", counter, self->_sessionCounter, self->_identifier);
         if (self->_sessionCounter == counter) self->_onUserGuidSoftLimitReached();
     });
 }
@@ -224,11 +222,11 @@ void ClientSessionManager::_onUserGuidSoftLimitReached()
 {
     if (!_session) return;
     _updateState(SessionEvent::SoftLimit, {});
-    log().log("soft limit reached, maxtimer session id {} {}", _sessionCounter, _identifier);
+    log(kLogSession).log("soft limit reached, maxtimer session id {} {}", _sessionCounter, _identifier);
     _sessionQueue->after(kFromSoftLimitToMaxTime, [weak = weak_from_this(), counter = _sessionCounter] {
         const auto self = weak.lock();
         if (!self) return;
-        log().debug("max timer expired expected {} current {}", counter, self->_sessionCounter);
+        log(kLogSession).debug("max timer expired expected {} current {}", counter, self->_sessionCounter);
         if (self->_sessionCounter == counter && self->_session) self->_updateState(SessionEvent::MaxTime, {});
     });
 }

@@ -33,11 +33,6 @@ std::optional<std::string> shortName(const std::string& identifier)
     return name ? std::optional<std::string>(*name) : std::nullopt;
 }
 
-const platform::Log& log()
-{
-    return TavrinLogForCategory(kLogSearch);
-}
-
 } // namespace
 
 ClientState::ClientState(std::string identifier, Assembly& assembly)
@@ -46,15 +41,15 @@ ClientState::ClientState(std::string identifier, Assembly& assembly)
       _bagFetch(std::make_shared<platform::Event>())
 {
     if (assembly.userDefaults.boolean("TAVNoQueryCache")) {
-        log().log("query cache OFF for {}", _identifier);
+        log(kLogSearch).log("query cache OFF for {}", _identifier);
     } else {
-        log().log("query cache ON for {}", _identifier);
+        log(kLogSearch).log("query cache ON for {}", _identifier);
         _queryCache = QueryCache::make(assembly);
     }
     if (assembly.sharedSession) {
-        log().log("Tavrin is using shared instance of guid controller");
+        log(kLogSearch).log("Tavrin is using shared instance of guid controller");
     } else {
-        log().log("Tavrin is using individual instance of guid controller {}", _identifier);
+        log(kLogSearch).log("Tavrin is using individual instance of guid controller {}", _identifier);
         _ownGuidController = std::make_shared<TavrinUserGUIDController>(assembly);
         _ownSessionManager = std::make_shared<ClientSessionManager>(assembly, _ownGuidController, _identifier);
     }
@@ -115,7 +110,7 @@ void ClientState::_ensureBag(std::move_only_function<void(bool)> then)
     const auto [state, fetch] = _queue->sync([this] {
         if (!_view.userAgent) return std::pair(State::NoAgent, _bagFetch);
         if (_view.bag) return std::pair(State::Held, _bagFetch);
-        log().log("Warming bag cache for agent: {}", *_view.userAgent);
+        log(kLogSearch).log("Warming bag cache for agent: {}", *_view.userAgent);
         if (!_bagObserver) {
             _bagObserver = _assembly.notificationCenter.observe(
                 TAVBagChangeNotification, [weak = weak_from_this()](const platform::Notification& notification) {
@@ -159,10 +154,11 @@ void ClientState::bagChangeNotification(const std::shared_ptr<const TAVBag>& bag
 void ClientState::warm()
 {
     const auto url = _assembly.bagController->warmURL();
-    if (!url) return log().log("warm not required, bag fetch in process");
+    if (!url) return log(kLogSearch).log("warm not required, bag fetch in process");
     const platform::Date now = _assembly.device.clock.wallNow();
     const auto last = _queue->sync([this] { return _lastNetworkRequest; });
-    if (last && now - *last < kConnectionStaysWarm) return log().log("warm not required, connection still warm");
+    if (last && now - *last < kConnectionStaysWarm)
+        return log(kLogSearch).log("warm not required, connection still warm");
 
     const platform::UrlRequest request = _assembly.requestFactory->warmRequest(*url);
     if (const auto& manager = _assembly.clientSessionManager) {
@@ -174,8 +170,9 @@ void ClientState::warm()
     _assembly.urlSession
         ->dataTask(request,
                    [](auto, std::optional<platform::UrlResponse> response, std::optional<platform::Error> error) {
-                       log().log("Status for warm request: ({}) error: ({})", response ? response->statusCode : 0,
-                                 error ? error->description() : "none");
+                       log(kLogSearch)
+                           .log("Status for warm request: ({}) error: ({})", response ? response->statusCode : 0,
+                                error ? error->description() : "none");
                    })
         ->resume();
     _markNetworkRequest();

@@ -48,7 +48,7 @@ ClientStateManager::~ClientStateManager() = default;
 
 std::shared_ptr<ClientState> ClientStateManager::stateForClientIdentifier(const std::optional<std::string>& identifier)
 {
-    const platform::Log& log = TavrinLogForCategory(kLogSession);
+    const platform::Log& log = tavrin::log(kLogSession);
     if (!identifier || identifier->empty()) {
         log.fault("client session identifier cannot be nil or empty");
         return nullptr;
@@ -112,7 +112,7 @@ void ClientStateManager::loadState()
 
 void ClientStateManager::_accept(std::shared_ptr<platform::ipc::Connection> connection)
 {
-    const platform::Log& log = TavrinLogForCategory(kLogConnection);
+    const platform::Log& log = tavrin::log(kLogConnection);
     log.debug("new endpoint connection");
     connection->exportObject(endpointHandler(weak_from_this()));
     // The handler owns the connection until it ends.

@@ -33,11 +33,6 @@ constexpr std::int64_t kLongestDelay = 24 * 60 * 60;
 /// Time limit for the list of downloads that a bag cancels.
 constexpr std::chrono::seconds kLongestWait(60);
 
-const platform::Log& log()
-{
-    return TavrinLogForCategory(kLogDownloadManager);
-}
-
 std::string identifierOf(const UrlRequest& request)
 {
     const std::string* identifier = request.headers.find(kIdentifierHeader);
@@ -53,7 +48,8 @@ std::string textOf(const platform::HttpHeaders& headers)
 
 void logTaskError(const std::string& reason)
 {
-    log().error("download task error {}", makeTAVError(TAVErrorInvalidResponse, reason).description());
+    log(kLogDownloadManager)
+        .error("download task error {}", makeTAVError(TAVErrorInvalidResponse, reason).description());
 }
 
 } // namespace
@@ -123,7 +119,7 @@ platform::Result<DownloadManager::Resource> DownloadManager::fileHandleForResour
 
 void DownloadManager::bagChangeNotification(const std::shared_ptr<const TAVBag>& bag)
 {
-    log().log("bag change: {}", bag->version());
+    log(kLogDownloadManager).log("bag change: {}", bag->version());
     _start();
     _queue->async([weak = weak_from_this(), bag] {
         if (const auto self = weak.lock()) self->_downloadBagResources(bag);
@@ -146,7 +142,7 @@ void DownloadManager::_start()
 {
     // A concurrent caller returns after the loading is queued, so its own tasks run later.
     std::call_once(_started, [this] {
-        log().log("started");
+        log(kLogDownloadManager).log("started");
         _queue->async([weak = weak_from_this()] {
             if (const auto self = weak.lock()) self->_loadResources();
         });
@@ -199,7 +195,7 @@ void DownloadManager::_downloadBagResources(const std::shared_ptr<const TAVBag>&
         const auto self = weak.lock();
         if (!self) return;
         const bool arrived = list->arrived.signalled();
-        if (!arrived) log().error("the list of downloads did not arrive in time, cancelling none");
+        if (!arrived) log(kLogDownloadManager).error("the list of downloads did not arrive in time, cancelling none");
         self->_replaceDownloads(arrived ? std::move(list->tasks) : decltype(list->tasks)(), *bag);
     });
 }
@@ -208,7 +204,7 @@ void DownloadManager::_replaceDownloads(const std::vector<std::shared_ptr<platfo
                                         const TAVBag& bag)
 {
     for (const auto& task : tasks) {
-        log().log("canceling {}", task->originalRequest().url.string());
+        log(kLogDownloadManager).log("canceling {}", task->originalRequest().url.string());
         task->cancel();
     }
     for (const std::string_view key : kTAVResourceIdentifiers) {
@@ -216,7 +212,7 @@ void DownloadManager::_replaceDownloads(const std::vector<std::shared_ptr<platfo
         if (_isAllowed(identifier))
             _addResource(identifier, bag.resourceURL(identifier));
         else
-            log().log("{} is disabled, not downloading", identifier);
+            log(kLogDownloadManager).log("{} is disabled, not downloading", identifier);
     }
     _saveResources();
 }
@@ -248,7 +244,7 @@ void DownloadManager::_startPending(const std::string& identifier, std::uint64_t
     _pending.erase(pending);
     const auto found = _resources.find(identifier);
     if (found == _resources.end()) return;
-    if (!_isAllowed(identifier)) return log().log("{} is disabled, not downloading", identifier);
+    if (!_isAllowed(identifier)) return log(kLogDownloadManager).log("{} is disabled, not downloading", identifier);
     if (const auto reason = downloadReason(found->second, url, _fileExists(identifier)))
         _downloadResource(found->second, url, *reason);
 }
@@ -256,10 +252,11 @@ void DownloadManager::_startPending(const std::string& identifier, std::uint64_t
 void DownloadManager::_downloadResource(const DownloadResource& resource, const Url& url, std::string_view reason)
 {
     UrlRequest request = _createDownloadRequest(resource, url);
-    log().log("starting download of {} reason: {} delay: {:f} headers: {}", url.string(), reason,
-              platform::toSeconds(_delay()), platform::Private{textOf(request.headers)}); // may reveal the location
+    log(kLogDownloadManager)
+        .log("starting download of {} reason: {} delay: {:f} headers: {}", url.string(), reason,
+             platform::toSeconds(_delay()), platform::Private{textOf(request.headers)}); // may reveal the location
     const auto task = _assembly.downloadURLSession->downloadTask(std::move(request));
-    if (!task) return log().error("download task error {}", task.error().description());
+    if (!task) return log(kLogDownloadManager).error("download task error {}", task.error().description());
     (*task)->setNote(url.string()); // the request's URL has more query items
     (*task)->resume();
 }
@@ -312,7 +309,7 @@ platform::Result<fs::path> DownloadManager::_pathToResource(const std::string& i
 
 void DownloadManager::_deleteResource(const std::string& identifier, File file)
 {
-    log().info("deleting resource: {}", identifier);
+    log(kLogDownloadManager).info("deleting resource: {}", identifier);
     _resources.erase(identifier);
     _pending.erase(identifier);
     _publish();
@@ -323,10 +320,12 @@ void DownloadManager::_deleteResource(const std::string& identifier, File file)
 void DownloadManager::_removeFile(const std::string& identifier) const
 {
     const auto path = _pathToResource(identifier);
-    if (!path) return log().error("error trying to get path to file for deletion {}", path.error().description());
+    if (!path)
+        return log(kLogDownloadManager)
+            .error("error trying to get path to file for deletion {}", path.error().description());
     const auto removed = _assembly.fileManager.remove(*path);
     if (!removed && removed.error().code != ENOENT)
-        log().error("error deleting resource {}: {}", identifier, removed.error().description());
+        log(kLogDownloadManager).error("error deleting resource {}: {}", identifier, removed.error().description());
 }
 
 void DownloadManager::taskDidFinishDownloading(const std::shared_ptr<platform::BackgroundTask>& task,
@@ -335,18 +334,21 @@ void DownloadManager::taskDidFinishDownloading(const std::shared_ptr<platform::B
     const UrlRequest& request = task->originalRequest();
     const std::string identifier = identifierOf(request);
     if (identifier.empty())
-        return log().error("failed to find download for identifier: {} url: {}", identifier, request.url.string());
+        return log(kLogDownloadManager)
+            .error("failed to find download for identifier: {} url: {}", identifier, request.url.string());
     const auto path = _pathToResource(identifier);
-    if (!path) return log().error("failed getting destination URL for {}", identifier);
+    if (!path) return log(kLogDownloadManager).error("failed getting destination URL for {}", identifier);
 
     if (response.statusCode == 200) {
-        log().log("download of {} finished {}", identifier, response.url.string());
+        log(kLogDownloadManager).log("download of {} finished {}", identifier, response.url.string());
         const auto made = _assembly.fileManager.createDirectories(path->parent_path());
-        if (!made) return log().error("error getting cache directory {}", made.error().description());
+        if (!made)
+            return log(kLogDownloadManager).error("error getting cache directory {}", made.error().description());
         const auto replaced = _assembly.fileManager.replace(*path, file);
-        if (!replaced) return log().error("error copying download {}", replaced.error().description());
+        if (!replaced)
+            return log(kLogDownloadManager).error("error copying download {}", replaced.error().description());
     } else {
-        log().log("download of {} got a {} response", identifier, response.statusCode);
+        log(kLogDownloadManager).log("download of {} got a {} response", identifier, response.statusCode);
         if (response.statusCode != 304) return;
     }
     _start(); // a task of an earlier process may report before the first bag
@@ -366,7 +368,8 @@ void DownloadManager::_noteReceived(const std::string& identifier, const Value& 
     _queue->assertOnQueue();
     const auto found = _resources.find(identifier);
     if (found == _resources.end()) { // no longer in the bag, or deleted after a move
-        log().error("could not find resource for download identifier: {} url: {}", identifier, request.url.string());
+        log(kLogDownloadManager)
+            .error("could not find resource for download identifier: {} url: {}", identifier, request.url.string());
         return logTaskError(fmt::format("can't find {}", identifier));
     }
     DownloadResource& resource = found->second;
@@ -375,7 +378,7 @@ void DownloadManager::_noteReceived(const std::string& identifier, const Value& 
         resource.redirectUrl = response.url;
     else if (response.statusCode == 200)
         resource.redirectUrl.reset(); // a 304 keeps the old copy and its origin
-    log().log("{} url: {}", identifier, response.url.string());
+    log(kLogDownloadManager).log("{} url: {}", identifier, response.url.string());
     _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.resourcefilesfetched");
     _saveResources();
 }
@@ -390,7 +393,7 @@ void DownloadManager::taskDidComplete(const std::shared_ptr<platform::Background
         reason = fmt::format("download error {} of {} {}", error->description(), task->originalRequest().url.string(),
                              error->code);
     else if (!response || response->url.empty())
-        return log().error("task completed with nil url and error: {}", "none");
+        return log(kLogDownloadManager).error("task completed with nil url and error: {}", "none");
     else if (response->statusCode != 200 && response->statusCode != 304)
         reason = fmt::format("status code {}", response->statusCode);
     else

@@ -305,8 +305,7 @@ void Exchange::_forceFetch(const UrlResponse& response)
     const auto announcement = platform::parseJson(*header);
     if (announcement && announcement->asDictionary() && _client->bag())
         return _assembly.bagController->forceFetchBag(*announcement);
-    TavrinLogForCategory(kLogSearch)
-        .error("Failed to deserialize X-Quorvane-ForceFetch header data into a dictionary: {}", *header);
+    log(kLogSearch).error("Failed to deserialize X-Quorvane-ForceFetch header data into a dictionary: {}", *header);
 }
 
 void Exchange::_addFeedback(std::shared_ptr<ZRFeedback> record, std::uint64_t clientQueryId)

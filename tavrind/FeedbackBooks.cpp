@@ -52,12 +52,12 @@ void FeedbackBooks::_load()
     const auto contents = _files.read(_path, kMaximumFileSize);
     if (!contents) {
         if (contents.error().code != ENOENT)
-            TavrinLogForCategory(kLogFeedback).error("feedback books not read: {}", contents.error().reason());
+            log(kLogFeedback).error("feedback books not read: {}", contents.error().reason());
         return;
     }
     const auto books = platform::parseJson(contents->view(), kMaximumFileSize);
     if (!books || !books->asDictionary())
-        return TavrinLogForCategory(kLogFeedback).error("feedback books are damaged, starting with empty ones");
+        return log(kLogFeedback).error("feedback books are damaged, starting with empty ones");
 
     for (std::size_t fate = 0; fate < kFeedbackFates; ++fate) {
         const Value& group = fate < kFirstDropped ? *books : (*books)["dropped"];
@@ -128,7 +128,7 @@ void FeedbackBooks::save()
     const std::string text = platform::toJson(books);
     auto written = _files.createDirectories(_path.parent_path());
     if (written) written = _files.writeAtomically(_path, text);
-    if (!written) TavrinLogForCategory(kLogFeedback).error("feedback books not saved: {}", written.error().reason());
+    if (!written) log(kLogFeedback).error("feedback books not saved: {}", written.error().reason());
 }
 
 void FeedbackBooks::saveSoon()

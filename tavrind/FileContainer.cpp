@@ -24,11 +24,6 @@ using platform::Bytes;
 
 namespace {
 
-const platform::Log& log()
-{
-    return TavrinLogForCategory(kLogFeedbackStorage);
-}
-
 /// Returns the classes of records in a session file.
 const platform::RecordClasses& fileRecordClasses()
 {
@@ -56,7 +51,7 @@ std::shared_ptr<platform::Record> readNext(ArchivedDataIterator& records)
     const auto archive = records.readNextObject();
     if (!archive) return nullptr;
     auto record = platform::unarchive(*archive, fileRecordClasses());
-    if (!record) log().error("{}", record.error().reason());
+    if (!record) log(kLogFeedbackStorage).error("{}", record.error().reason());
     return record.value_or(nullptr);
 }
 
@@ -77,11 +72,11 @@ void FileContainer::writeSessionHeader(ClientSessionHeader header)
 {
     _store->queue->async([self = shared_from_this(), header = std::move(header)] {
         if (!self->_archiveObject(self->_store->version)) {
-            log().error("Could not write version string");
+            log(kLogFeedbackStorage).error("Could not write version string");
             self->closeFile();
         }
         if (!self->_archiveObject(header)) {
-            log().error("Could not write root object");
+            log(kLogFeedbackStorage).error("Could not write root object");
             self->closeFile();
         }
     });
@@ -111,13 +106,15 @@ bool FileContainer::_append(const std::string& archive)
     const std::uint64_t length = archive.size();
     if (end + sizeof(length) + length >= _store->maxFileSize) {
         _store->diagnosticData.addValue(1, "com.quorvane.tavrind.filesizeexceeded");
-        log().error("bytes written ({}) + feedback ({}) exceeds max session size ({})", end, length,
-                    _store->maxFileSize);
+        log(kLogFeedbackStorage)
+            .error("bytes written ({}) + feedback ({}) exceeds max session size ({})", end, length,
+                   _store->maxFileSize);
         return false;
     }
     const auto frame = std::bit_cast<std::array<char, sizeof(length)>>(length);
     const auto written = _fileHandle->append({{frame.data(), frame.size()}, archive});
-    if (!written) log().error("record not written to {}: {}", _fileUrl.string(), written.error().reason());
+    if (!written)
+        log(kLogFeedbackStorage).error("record not written to {}: {}", _fileUrl.string(), written.error().reason());
     return written.has_value();
 }
 
@@ -130,7 +127,7 @@ void FileContainer::closeFile()
 {
     _store->queue->assertOnQueue();
     if (!_fileHandle) return;
-    log().debug("close file url {}", _fileUrl.string());
+    log(kLogFeedbackStorage).debug("close file url {}", _fileUrl.string());
     _fileHandle.reset();
 }
 
@@ -141,15 +138,15 @@ FileReading FileContainer::read()
 
 FileReading FileContainer::_notRead(FeedbackFate fate, const std::string& text) const
 {
-    log().error("{}", text);
+    log(kLogFeedbackStorage).error("{}", text);
     return {.session = nullptr, .lost = _feedbackCount, .fate = fate};
 }
 
 FileReading FileContainer::_read()
 {
-    log().debug("reading file url {}", _fileUrl.string());
+    log(kLogFeedbackStorage).debug("reading file url {}", _fileUrl.string());
     if (_fileHandle) {
-        log().error("file is already open closing it {}", _fileUrl.string());
+        log(kLogFeedbackStorage).error("file is already open closing it {}", _fileUrl.string());
         closeFile();
     }
     if (_fileUrl.empty()) return _notRead(FeedbackFate::Unreadable, "No file url available");
@@ -191,10 +188,11 @@ FileReading FileContainer::_unarchiveObject(const Bytes& data)
     while (records.hasMore()) {
         const std::uint64_t position = records.position();
         const auto record = readNext(records);
-        if (!record) log().error("could not unarchive feedback range {} size {}", position, records.size());
+        if (!record)
+            log(kLogFeedbackStorage).error("could not unarchive feedback range {} size {}", position, records.size());
         auto feedback = std::dynamic_pointer_cast<TavrinFeedback>(record);
         if (!feedback) {
-            log().error("tavrin feedback expected");
+            log(kLogFeedbackStorage).error("tavrin feedback expected");
             break;
         }
         feedbacks.push_back(std::move(feedback));

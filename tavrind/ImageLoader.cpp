@@ -45,11 +45,6 @@ constexpr std::size_t kMaximumImage = 10u << 20;
 constexpr std::size_t kMaximumAnswer = 16u << 20;
 constexpr std::size_t kMaximumHosts = 1000;
 
-const platform::Log& log()
-{
-    return TavrinLogForCategory(kLogImages);
-}
-
 /// Returns all URLs in the order of fetching.
 std::vector<Url> inOrder(OrderedImages images)
 {
@@ -147,7 +142,8 @@ Value ImageLoader::_cachedImages(const Value::Array& images, const TAVBag& bag) 
     std::size_t size = 0;
     const auto map = [&](const std::string& name, platform::Bytes image) {
         if (size + image.size() > kMaximumAnswer)
-            return log().error("the reply is full, leaving out {} bytes of image {}", image.size(), Private{name});
+            return log(kLogImages)
+                .error("the reply is full, leaving out {} bytes of image {}", image.size(), Private{name});
         size += image.size();
         loaded.set(name, std::move(image));
     };
@@ -156,12 +152,12 @@ Value ImageLoader::_cachedImages(const Value::Array& images, const TAVBag& bag) 
         const std::string* identifier = image["id"].asString();
         if ((url && loaded.contains(*url)) || (!url && identifier && loaded.contains(*identifier))) continue;
         if (const auto data = _cachedImage(url ? Url::parse(*url) : std::nullopt); !data.empty()) {
-            log().log("mapping image url {} to {} bytes of data", Private{*url}, data.size());
+            log(kLogImages).log("mapping image url {} to {} bytes of data", Private{*url}, data.size());
             map(*url, data);
         } else if (identifier && !loaded.contains(*identifier)) {
             const auto other = _cachedImage(bag.urlForIdentifier(*identifier));
             if (other.empty()) continue;
-            log().log("mapping image id {} to {} bytes of data", Private{*identifier}, other.size());
+            log(kLogImages).log("mapping image id {} to {} bytes of data", Private{*identifier}, other.size());
             map(*identifier, other);
         }
     }
@@ -180,13 +176,15 @@ void ImageLoader::_fetchImageURL(const Url& url, std::optional<platform::Duratio
                                  platform::UrlSource source, const ImageGroup& group)
 {
     _imageQueue->assertOnQueue();
-    if (!url.scheme().starts_with("http")) return log().fault("invalid url scheme: {}", Private{url.string()});
+    if (!url.scheme().starts_with("http"))
+        return log(kLogImages).fault("invalid url scheme: {}", Private{url.string()});
     if (_imageFetches.join(url, group))
         return _startImageFetches(); // the fetch may have moved to a lane with a free slot
     const auto cache = _assembly.urlSession->cache();
-    if (cache && cache->find(url)) return log().log("found {} in cache", Private{url.string()});
+    if (cache && cache->find(url)) return log(kLogImages).log("found {} in cache", Private{url.string()});
     if (!_imageFetches.add({url, timeoutInterval, source}, group))
-        return log().error("{} images are waiting, not fetching {}", ImageFetches::kWaiting, Private{url.string()});
+        return log(kLogImages)
+            .error("{} images are waiting, not fetching {}", ImageFetches::kWaiting, Private{url.string()});
     _startImageFetches();
 }
 
@@ -197,7 +195,7 @@ void ImageLoader::_startImageFetches()
 
 void ImageLoader::_startImageFetch(const ImageFetch& fetch)
 {
-    log().log("fetching image {}", Private{fetch.url.string()});
+    log(kLogImages).log("fetching image {}", Private{fetch.url.string()});
     platform::Device& device = _assembly.device;
     platform::UrlRequest request{.url = fetch.url,
                                  .timeout = fetch.timeoutInterval,
@@ -229,14 +227,14 @@ void ImageLoader::_endImageFetch(const Load& load, const std::optional<UrlRespon
     const std::string& url = load.url.string();
     const int statusCode = response ? response->statusCode : 0;
     if (error) {
-        log().error("Error fetching image {}: {}", Private{url}, error->description());
+        log(kLogImages).error("Error fetching image {}: {}", Private{url}, error->description());
         ClientSessionManager::reportErrorAsTavrindFeedback(
             makeTAVError(TAVErrorInvalidResponse, fmt::format("image fetch error {}", error->description())),
             _assembly);
     } else if (statusCode != 200) {
-        log().error("Bad status code {} for image {}", statusCode, Private{url});
+        log(kLogImages).error("Bad status code {} for image {}", statusCode, Private{url});
     } else {
-        log().log("Fetched image {}", Private{url});
+        log(kLogImages).log("Fetched image {}", Private{url});
         _keepImage(load, *response);
     }
     _imageQueue->async([weak = weak_from_this(), ended = load.url] {
@@ -250,16 +248,16 @@ void ImageLoader::_endImageFetch(const Load& load, const std::optional<UrlRespon
 void ImageLoader::_keepImage(const Load& load, const UrlResponse& response)
 {
     if (!load.file) {
-        log().error("opening file failed {}", load.file.error().description());
+        log(kLogImages).error("opening file failed {}", load.file.error().description());
         return ClientSessionManager::reportErrorAsTavrindFeedback(
             makeTAVError(TAVErrorInvalidResponse, "file open failed"), _assembly);
     }
     const auto image = mmapFileHandle(*load.file);
     if (!image) {
-        log().error("mmap failed {}", image.error().description());
+        log(kLogImages).error("mmap failed {}", image.error().description());
         return ClientSessionManager::reportErrorAsTavrindFeedback(image.error(), _assembly);
     }
-    log().log("caching {} bytes for {}", image->size(), Private{load.url.string()});
+    log(kLogImages).log("caching {} bytes for {}", image->size(), Private{load.url.string()});
     if (const auto cache = _assembly.urlSession->cache()) cache->store(load.url, response, *image);
     const auto task = load.task.lock();
     _addImageFeedback(std::make_shared<ZREndNetworkSearchFeedback>(load.start, image->size(), response.statusCode,

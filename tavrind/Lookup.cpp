@@ -28,11 +28,6 @@ using platform::Value;
 
 namespace {
 
-const platform::Log& log()
-{
-    return TavrinLogForCategory(kLogLookUp);
-}
-
 std::string identifierOf(Lookup::SourceKind kind)
 {
     return std::string(kind == Lookup::Monthly ? kTAVLookupHintsMonthly : kTAVLookupHintsWeekly);
@@ -92,8 +87,9 @@ public:
         const std::string* completion = instructions["completion"].asString();
         const bool completes = !completion || completion->empty() || _search.contains(*completion);
         if (score < minimum || !completes) {
-            log().debug("dropping lookup result. keyword score: {:f} min keyword score: {:f} completion exists: {:d}",
-                        score, minimum, completes);
+            log(kLogLookUp)
+                .debug("dropping lookup result. keyword score: {:f} min keyword score: {:f} completion exists: {:d}",
+                       score, minimum, completes);
             return false;
         }
         const float subjectMinimum = numberIn(instructions["min_subject_score"]);
@@ -101,7 +97,8 @@ public:
         const std::string* subject = instructions["subject"].asString();
         const float index = !subject || subject->empty() ? 0 : jaccardIndex(_words, wordsIn(*subject, _finder));
         if (subjectMinimum > index) {
-            log().debug("dropping lookup result. jaccard index: {:f} min subject score: {:f}", index, subjectMinimum);
+            log(kLogLookUp)
+                .debug("dropping lookup result. jaccard index: {:f} min subject score: {:f}", index, subjectMinimum);
             return false;
         }
         return true;
@@ -118,11 +115,12 @@ private:
 void Lookup::filterLookupResultsWithRequest(const TAVLookupRequest& request, Value& response, const std::string& locale)
 {
     if (!response.asArray())
-        return log().error("lookup response is not an array. who knows what this is: {}",
-                           Private{platform::toJson(response)});
+        return log(kLogLookUp)
+            .error("lookup response is not an array. who knows what this is: {}", Private{platform::toJson(response)});
     if (response.count() == 0)
-        return log().error("no data to process for lookup response. request: {} response: {}",
-                           Private{request.queryString}, Private{platform::toJson(response)});
+        return log(kLogLookUp)
+            .error("no data to process for lookup response. request: {} response: {}", Private{request.queryString},
+                   Private{platform::toJson(response)});
     LookupContext context(request.queryContext.value_or(""), locale);
     for (Value& resultSet : response.mutableArray()) {
         if (!resultSet.asDictionary()) continue;
@@ -174,7 +172,7 @@ std::optional<std::string> Lookup::signatureFromURL(const platform::Url& url) co
         begin = end + 1;
     }
     if (elements.size() <= 4) {
-        log().error("invalid lookup hints url when processing signature: {}", url.string());
+        log(kLogLookUp).error("invalid lookup hints url when processing signature: {}", url.string());
         return std::nullopt;
     }
     return fmt::format("{}-{}-{}", elements[3], elements[4], elements[2]);
@@ -197,16 +195,18 @@ void Lookup::_handleHintsFile(const platform::Notification& notification)
 
 void Lookup::_handleHintsFile(const std::optional<std::filesystem::path>& location, SourceKind kind)
 {
-    log().debug("processing lookup hints for location: {} sourceKind: {}", location ? location->string() : "none",
-                static_cast<int>(kind));
+    log(kLogLookUp)
+        .debug("processing lookup hints for location: {} sourceKind: {}", location ? location->string() : "none",
+               static_cast<int>(kind));
     std::shared_ptr<FileHandle> file;
     if (location) {
         auto opened = _assembly.fileManager.openForReading(*location);
         if (opened)
             file = std::make_shared<FileHandle>(std::move(*opened));
         else
-            log().error("error trying to open hints file: {} at location: {}", opened.error().description(),
-                        location->string());
+            log(kLogLookUp)
+                .error("error trying to open hints file: {} at location: {}", opened.error().description(),
+                       location->string());
     }
     _queue->async([weak = weak_from_this(), file, kind] {
         const auto self = weak.lock();
@@ -218,7 +218,7 @@ void Lookup::_handleHintsFile(const std::optional<std::filesystem::path>& locati
 
 void Lookup::_reprocessHintsFiles()
 {
-    log().debug("reprocessing lookup hints files");
+    log(kLogLookUp).debug("reprocessing lookup hints files");
     _queue->async([weak = weak_from_this()] {
         const auto self = weak.lock();
         if (!self) return;
@@ -234,12 +234,14 @@ void Lookup::_reprocessHintsFile(SourceKind kind, const Dictionary& versions)
     const std::string version = versionIn(versions, identifier);
     const auto signature = _assembly.device.dataDetectors.clientSignature(kind);
     if (signature && *signature == version) return;
-    log().info("signature ({}) does not match version ({}), DD for kind: {} requires reprocessing",
-               signature.value_or(""), version, static_cast<int>(kind));
+    log(kLogLookUp)
+        .info("signature ({}) does not match version ({}), DD for kind: {} requires reprocessing",
+              signature.value_or(""), version, static_cast<int>(kind));
     const auto resource = _assembly.downloadManager->fileHandleForResource(identifier);
     if (!resource)
-        return log().info("reprocess file doesn't exist or there was an error. file: {} error: {}", "none",
-                          resource.error().description());
+        return log(kLogLookUp)
+            .info("reprocess file doesn't exist or there was an error. file: {} error: {}", "none",
+                  resource.error().description());
     _pushDDSourceFile(&resource->file, kind, version);
 }
 
@@ -248,8 +250,8 @@ void Lookup::_pushDDSourceFile(const FileHandle* file, SourceKind kind, const st
     _queue->assertOnQueue();
     const auto pushed = _assembly.device.dataDetectors.setSource(kind, file, version);
     if (pushed) return;
-    log().error("failed to push data to data detectors");
-    log().error("data detectors: {}", pushed.error().description());
+    log(kLogLookUp).error("failed to push data to data detectors");
+    log(kLogLookUp).error("data detectors: {}", pushed.error().description());
 }
 
 } // namespace tavrin

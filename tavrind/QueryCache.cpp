@@ -19,11 +19,6 @@ namespace {
 
 constexpr std::size_t kMaximumCost = 0x200000;
 
-const platform::Log& log()
-{
-    return TavrinLogForCategory(kLogCaching);
-}
-
 std::size_t costOf(const CachedResultSet& set)
 {
     return static_cast<std::size_t>(static_cast<double>(set.resultSetSize()) * 1.5);
@@ -57,7 +52,7 @@ std::shared_ptr<const CachedResultSet> QueryCache::getRequest(const TAVRequest& 
 {
     const std::string key = platform::lowerCased(request.queryString);
     const std::size_t keyLength = platform::utf16Length(key);
-    log().debug("cache lookup: {}", key);
+    log(kLogCaching).debug("cache lookup: {}", key);
     return _queue->sync([&]() -> std::shared_ptr<const CachedResultSet> {
         const platform::Date now = _assembly.device.clock.wallNow();
         std::vector<std::string> expired;
@@ -70,8 +65,9 @@ std::shared_ptr<const CachedResultSet> QueryCache::getRequest(const TAVRequest& 
         for (const std::string& query : expired) _tree.removeObjectForKey(query);
 
         for (const CachedResultSet* set : candidates)
-            log().debug("entry {} prefix: {} input: {} score: {:f}", fmt::ptr(set), key, set->input,
-                        set->completionScore);
+            log(kLogCaching)
+                .debug("entry {} prefix: {} input: {} score: {:f}", fmt::ptr(set), key, set->input,
+                       set->completionScore);
         const CachedResultSet* pick = pickCompletion(candidates);
         return pick ? pick->shared_from_this() : nullptr;
     });
@@ -81,8 +77,9 @@ bool QueryCache::_isKept(const CachedResultSet& set)
 {
     if (set.query.empty() || set.query.contains('\0')) return false;
     if (set.inputLength <= set.queryLength) return true;
-    log().error("BUG: NOT caching '{}' because input is longer than completed query '{}'", Private{set.input},
-                Private{set.query});
+    log(kLogCaching)
+        .error("BUG: NOT caching '{}' because input is longer than completed query '{}'", Private{set.input},
+               Private{set.query});
     return false;
 }
 
@@ -105,10 +102,10 @@ void QueryCache::_store(std::shared_ptr<const CachedResultSet> set)
 {
     _queue->assertOnQueue();
     const std::size_t cost = costOf(*set);
-    if (cost >= kMaximumCost) return log().error("NOT caching '{}' with cost {}", Private{set->query}, cost);
-    log().log("caching '{}' with cost {}", Private{set->query}, cost);
+    if (cost >= kMaximumCost) return log(kLogCaching).error("NOT caching '{}' with cost {}", Private{set->query}, cost);
+    log(kLogCaching).log("caching '{}' with cost {}", Private{set->query}, cost);
     if (_currentCost + cost >= kMaximumCost) {
-        log().log("!!! exceeded max cost, flushing cache !!!");
+        log(kLogCaching).log("!!! exceeded max cost, flushing cache !!!");
         _clearCache();
     }
     if (!_source) _startListeningForMemoryPressure();
@@ -146,7 +143,7 @@ void QueryCache::_startListeningForMemoryPressure()
         if (!self) return;
         self->_queue->async([self] {
             if (!self->_source) return; // already cleared
-            log().log("emptying cache under memory pressure");
+            log(kLogCaching).log("emptying cache under memory pressure");
             self->_clearCache();
             self->_source.reset();
         });

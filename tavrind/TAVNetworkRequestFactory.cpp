@@ -33,11 +33,6 @@ namespace {
 constexpr const char* kApiKey = "walrus7351";
 constexpr const char* kDownloadUserAgent = "Vistrel/1";
 
-const platform::Log& log()
-{
-    return TavrinLogForCategory(kLogRequest);
-}
-
 // The kinds of request as bits: each rule of the table below names the kinds that it applies to.
 enum Kind : unsigned {
     kBagFetch = 1 << 0,
@@ -400,7 +395,7 @@ void TAVNetworkRequestFactory::_setUpDebuggingQueryItems()
     const auto parameters = _assembly.userDefaults.string("TAVDebugParameters");
     if (!parameters) return;
     ++_bagContextGeneration;
-    log().log("processing debug parameters: ({})", *parameters);
+    log(kLogRequest).log("processing debug parameters: ({})", *parameters);
     std::string_view rest = *parameters;
     for (std::size_t end = 0; end != std::string_view::npos;) {
         end = rest.find('&');
@@ -413,7 +408,7 @@ void TAVNetworkRequestFactory::_setUpDebuggingQueryItems()
             _context.debuggingQueryItems.emplace_back(std::string(piece.substr(0, equals)),
                                                       std::string(piece.substr(equals + 1)));
         else
-            log().error("invalid query components: {}", piece);
+            log(kLogRequest).error("invalid query components: {}", piece);
     }
 }
 
@@ -432,7 +427,7 @@ void TAVNetworkRequestFactory::_updateLocale()
         languages.emplace_back(language);
     }
     _context.preferredLanguages = encodable && !languages.empty() ? platform::toJson(languages) : "";
-    if (!encodable) log().error("Error encoding preferred languages {}.", platform::toJson(languages));
+    if (!encodable) log(kLogRequest).error("Error encoding preferred languages {}.", platform::toJson(languages));
     ++_bagContextGeneration;
 }
 
@@ -452,8 +447,9 @@ bool TAVNetworkRequestFactory::_updateProfile(const platform::DeviceProfile& pro
     _context.geoSessionId = profile.geoSessionId.value_or("");
     _context.geoSessionEntity = profile.geoSessionEntity.value_or("");
     if (_context.geoSessionId.empty() && !_context.geoSessionEntity.empty())
-        log().error("GEOUserSessionEntity does not respond to selector sessionIDString, actual class is {}",
-                    "geoSession");
+        log(kLogRequest)
+            .error("GEOUserSessionEntity does not respond to selector sessionIDString, actual class is {}",
+                   "geoSession");
     const bool changed = _context.geoDeviceCountryCode != before;
     if (changed) ++_bagContextGeneration;
     return changed;
@@ -478,7 +474,7 @@ void TAVNetworkRequestFactory::_updateLocation(const std::optional<platform::Loc
 
 void TAVNetworkRequestFactory::_setNoLocationWithReason(const std::string& reason)
 {
-    log().info("no location: {}", reason);
+    log(kLogRequest).info("no location: {}", reason);
     _currentLocation.reset();
     _context.geoLocationLatLng.clear();
     _context.geoLocationSource.clear();

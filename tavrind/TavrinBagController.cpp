@@ -50,11 +50,6 @@ constexpr const char* kBagUrlDefault = "TAVBagURL";
 constexpr const char* kNewsUserAgent = "news/1.0";
 constexpr unsigned kFetchRetries = 5;
 
-const platform::Log& log()
-{
-    return TavrinLogForCategory(kLogBag);
-}
-
 } // namespace
 
 BagStaleness bagStaleness(std::optional<double> expiration, const std::string* cachedUrl, platform::Date now,
@@ -151,7 +146,7 @@ Url TavrinBagController::bagFetchURLWithCountry(const std::string& country) cons
 {
     if (const auto configured = _assembly.userDefaults.string(kBagUrlDefault)) {
         if (auto url = Url::parse(*configured); url && !url->host().empty()) return *url;
-        log().error("Malformed tavrin bag URL in user defaults key {}", kBagUrlDefault);
+        log(kLogBag).error("Malformed tavrin bag URL in user defaults key {}", kBagUrlDefault);
     }
     const bool china = country.size() == 2 && std::toupper(static_cast<unsigned char>(country[0])) == 'C' &&
                        std::toupper(static_cast<unsigned char>(country[1])) == 'N';
@@ -223,11 +218,13 @@ bool TavrinBagController::_isRefreshRequiredForCachedBag(const Value& rawBag)
     switch (bagStaleness(expiration, cachedUrl, now, [&] { return currentUrl = _bagCacheURL(); })) {
     case BagStaleness::Fresh: return false;
     case BagStaleness::Expired:
-        log().log("bag expired: {:f}", expiration.value_or(0) - platform::secondsSince1970(now));
+        log(kLogBag).log("bag expired: {:f}", expiration.value_or(0) - platform::secondsSince1970(now));
         _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.bag.expired");
         return true;
-    case BagStaleness::UrlChanged: log().log("bag url changed from: {} to {}", *cachedUrl, currentUrl); return true;
-    case BagStaleness::NoUrl: log().log("no bag URL found in cache"); return true;
+    case BagStaleness::UrlChanged:
+        log(kLogBag).log("bag url changed from: {} to {}", *cachedUrl, currentUrl);
+        return true;
+    case BagStaleness::NoUrl: log(kLogBag).log("no bag URL found in cache"); return true;
     }
     return true;
 }
@@ -236,12 +233,12 @@ platform::Result<std::string> TavrinBagController::_pathToCachedBag()
 {
     const auto& caches = _assembly.device.directories.caches;
     if (auto made = _assembly.fileManager.createDirectories(caches); !made) {
-        log().error("error getting cache directory {}", made.error().description());
+        log(kLogBag).error("error getting cache directory {}", made.error().description());
         return std::unexpected(made.error());
     }
     const auto directory = caches / "com.quorvane.tavrind";
     if (auto made = _assembly.fileManager.createDirectories(directory); !made) {
-        log().error("error creating agent-specific cache directory {}", made.error().description());
+        log(kLogBag).error("error creating agent-specific cache directory {}", made.error().description());
         return std::unexpected(made.error());
     }
     return (directory / "bag.plist").string();
@@ -250,7 +247,7 @@ platform::Result<std::string> TavrinBagController::_pathToCachedBag()
 Value TavrinBagController::diskCachedBagDictionary()
 {
     if (!Flags::diskBagCacheEnabled()) {
-        log().log("skipping check for bag on disk because the flag is disabled");
+        log(kLogBag).log("skipping check for bag on disk because the flag is disabled");
         return {};
     }
     const auto path = _pathToCachedBag();
@@ -259,11 +256,11 @@ Value TavrinBagController::diskCachedBagDictionary()
     if (!bytes && bytes.error().domain == platform::kPosixErrorDomain && bytes.error().code == ENOENT) return {};
     auto bag = bytes ? platform::parsePropertyList(bytes->view(), kMaximumBagSize) : std::unexpected(bytes.error());
     if (!bag) {
-        log().fault("Error reading from bag cache: {}.", bag.error().description());
+        log(kLogBag).fault("Error reading from bag cache: {}.", bag.error().description());
         return {};
     }
     if (!bag->asDictionary()) {
-        log().log("Unexpected class deserialized from bag cache: {}.", platform::typeName(bag->type()));
+        log(kLogBag).log("Unexpected class deserialized from bag cache: {}.", platform::typeName(bag->type()));
         return {};
     }
     return std::move(*bag); // stale or not
@@ -282,26 +279,26 @@ Value TavrinBagController::cacheBagDictionary(const Value& fetched)
 {
     Value bag = _dictionaryToCacheBag(fetched);
     if (!Flags::diskBagCacheEnabled()) {
-        log().log("skipping writing bag to disk because the flag is disabled");
+        log(kLogBag).log("skipping writing bag to disk because the flag is disabled");
         return bag;
     }
     const auto path = _pathToCachedBag();
     if (!path) {
-        log().error("Couldn't get path to cache bag.  Error: {}.", path.error().description());
+        log(kLogBag).error("Couldn't get path to cache bag.  Error: {}.", path.error().description());
         return bag;
     }
     const auto list = platform::toPropertyList(bag);
     if (!list)
-        log().error("Error writing bag to persistent cache: {}.", list.error().description());
+        log(kLogBag).error("Error writing bag to persistent cache: {}.", list.error().description());
     else if (auto written = _assembly.fileManager.writeAtomically(*path, *list); !written)
-        log().error("Could not write to {}", *path + " (" + written.error().reason() + ")");
+        log(kLogBag).error("Could not write to {}", *path + " (" + written.error().reason() + ")");
     return bag;
 }
 
 void TavrinBagController::cacheBagState(std::shared_ptr<const TAVBag> bag, bool fromDisk)
 {
     if (!bag) return;
-    for (const std::string& problem : bag->problems()) log().error("bag: {}; using the default", problem);
+    for (const std::string& problem : bag->problems()) log(kLogBag).error("bag: {}; using the default", problem);
     enum : unsigned long { kDisabled, kEnabled, kUnknown };
     const auto newsState = [](const TAVBag* some) -> unsigned long {
         return !some ? kUnknown : TAVBag(some->rawBag(), kNewsUserAgent).isEnabled() ? kEnabled : kDisabled;
@@ -312,7 +309,7 @@ void TavrinBagController::cacheBagState(std::shared_ptr<const TAVBag> bag, bool 
         _inMemoryBag = bag;
         _assembly.notificationCenter.post({.name = TAVBagChangeNotification, .userInfo = {{"bag", bag}}});
         if (before != after && !fromDisk) {
-            log().log("setting Tavrin News Available status to {}", after);
+            log(kLogBag).log("setting Tavrin News Available status to {}", after);
             _assembly.device.systemNotifier.post(after == kEnabled ? kNewsEnabledNotifyName : kNewsDisabledNotifyName);
         }
     });
@@ -328,8 +325,8 @@ void TavrinBagController::_fetchBagStateWithVersion(const std::string& version, 
 {
     platform::UrlRequest request = _assembly.requestFactory->bagFetchRequest(*this, _userAgent, version);
     request.maximumResponseSize = kMaximumBagSize;
-    log().debug("Initiating bag fetch attempt with request {} header {}", request.url.string(),
-                describe(request.headers));
+    log(kLogBag).debug("Initiating bag fetch attempt with request {} header {}", request.url.string(),
+                       describe(request.headers));
 
     auto fetch = std::make_shared<Fetch>();
     fetch->transaction = _assembly.device.transactions.begin("bagFetch");
@@ -345,7 +342,8 @@ void TavrinBagController::_fetchBagStateWithVersion(const std::string& version, 
         1, kFetchRetries, [weak = weak_from_this(), fetch](auto data, auto response, auto error, Value timingData) {
             auto self = weak.lock();
             if (!self) {
-                log().log("Error fetching bag, bag fetch task completed after BagFetchController was cleaned up");
+                log(kLogBag).log(
+                    "Error fetching bag, bag fetch task completed after BagFetchController was cleaned up");
                 return;
             }
             fetch->timingData = std::move(timingData);
@@ -376,27 +374,27 @@ void TavrinBagController::_fetchCompleted(Fetch& fetch, std::optional<platform::
         fetch.session->addFeedback(std::make_shared<TavrinFeedback>(std::move(record), 0, fetch.userGuid, _userAgent));
     };
     const int statusCode = response ? response->statusCode : 0;
-    log().log("resp: {}", statusCode);
+    log(kLogBag).log("resp: {}", statusCode);
     addFeedback(std::make_shared<ZREndNetworkSearchFeedback>(fetch.start, data ? data->size() : 0, statusCode,
                                                              std::move(fetch.timingData)));
 
     std::shared_ptr<const TAVBag> bag;
     if (error) {
-        log().error("Error fetching bag: {}", error->description());
+        log(kLogBag).error("Error fetching bag: {}", error->description());
     } else if (!data) {
-        log().error("Error fetching bag: returned data was not of the expected type.");
+        log(kLogBag).error("Error fetching bag: returned data was not of the expected type.");
         error = makeTAVError(TAVErrorBagFetch, "no data");
     } else if (statusCode != 200) {
-        log().error("Error fetching bag status code: {}", statusCode);
+        log(kLogBag).error("Error fetching bag status code: {}", statusCode);
         error = makeTAVError(TAVErrorBagFetch, fmt::format("statusCode {}", statusCode));
     } else if (auto parsed = platform::parseJson(data->view(), kMaximumBagSize); !parsed) {
-        log().error("error parsing bag json {}", parsed.error().description());
+        log(kLogBag).error("error parsing bag json {}", parsed.error().description());
         error = parsed.error();
     } else if (!parsed->asDictionary()) {
-        log().error("Error fetching bag: returned data was not of the expected type.");
+        log(kLogBag).error("Error fetching bag: returned data was not of the expected type.");
         error = makeTAVError(TAVErrorBagFetch, "not JSON object");
     } else {
-        log().log("Got bag: {}", platform::toJson(*parsed));
+        log(kLogBag).log("Got bag: {}", platform::toJson(*parsed));
         bag = std::make_shared<const TAVBag>(cacheBagDictionary(*parsed), _userAgent);
         cacheBagState(bag, false);
         _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.bag.fetches");
@@ -415,7 +413,7 @@ void TavrinBagController::_fetchCompleted(Fetch& fetch, std::optional<platform::
 
 void TavrinBagController::_handleRefreshNotification()
 {
-    log().debug("something significant changed (locale, geo). checking to see if bag needs update");
+    log(kLogBag).debug("something significant changed (locale, geo). checking to see if bag needs update");
     const auto bag = inMemoryBag();
     if (_isRefreshRequiredForCachedBag(bag ? bag->rawBag() : Value())) _fetchBagStateWithVersion({});
 }

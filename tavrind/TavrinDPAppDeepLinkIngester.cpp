@@ -28,32 +28,28 @@ constexpr std::chrono::seconds kReach = 24h;
 constexpr std::size_t kMaximumEvents = 100;
 constexpr std::size_t kMaximumListSize = 32u << 20;
 
-const platform::Log& log()
-{
-    return TavrinLogForCategory(kLogGeneral);
-}
-
 /// Reads a resource that holds a list of texts under `key`; `name` is for the log. Returns an empty list if it can't be
 /// read.
 DeepLinks::List fetchList(const DownloadManager& downloads, std::string_view resource, std::string_view key,
                           std::string_view name)
 {
-    log().debug("fetch crowdsourcing {}", name);
+    log(kLogGeneral).debug("fetch crowdsourcing {}", name);
     const auto file = downloads.fileHandleForResource(std::string(resource));
     if (!file) {
-        log().error("error reading crowdsourcing {} {}", name, file.error().description());
+        log(kLogGeneral).error("error reading crowdsourcing {} {}", name, file.error().description());
         return {};
     }
     const auto contents = mmapFileHandle(file->file);
     if (!contents) {
-        log().error("mmap failed {}", contents.error().description());
+        log(kLogGeneral).error("mmap failed {}", contents.error().description());
         return {};
     }
     const auto document = platform::parseJson(contents->view(), kMaximumListSize);
     const platform::Value::Array* texts = document ? (*document)[key].asArray() : nullptr;
     if (!texts) {
-        log().error("failed to fetch the {} from the stream {}", name,
-                    document ? fmt::format("no array \"{}\"", key) : document.error().description());
+        log(kLogGeneral)
+            .error("failed to fetch the {} from the stream {}", name,
+                   document ? fmt::format("no array \"{}\"", key) : document.error().description());
         return {};
     }
     DeepLinks::List list;
@@ -87,7 +83,7 @@ void TavrinDPAppDeepLinkIngester::ingestStartingOn(platform::Date start, platfor
     const platform::Device& device = _assembly.device;
     const auto events = platform::AppActivities(device.files, device.directories.data / knowledgeDirectoryPath)
                             .queryAppActivitiesAfterDate(start, end, kMaximumEvents);
-    if (!events) log().log("no app activities: {}", events.error().description());
+    if (!events) log(kLogGeneral).log("no app activities: {}", events.error().description());
     const auto entries = events ? DeepLinks::deepLinksFor(*events) : std::vector<DeepLinkEntry>();
     _assembly.diagnosticData.addValue(static_cast<std::int64_t>(entries.size()),
                                       "com.quorvane.tavrind.dp.eligiblelinks");
@@ -130,7 +126,7 @@ void TavrinDPAppDeepLinkIngester::_record(const DeepLinkSubmission& submission)
         const std::set<std::string>& links = submission.at(identifier);
         const auto recorded = recorder.record(fmt::format("{}.{}", appDeepLinkKey, identifier), links);
         if (!recorded) {
-            log().log("deep links not recorded: {}", recorded.error().description());
+            log(kLogGeneral).log("deep links not recorded: {}", recorded.error().description());
             counters.addValue(1, "com.quorvane.tavrind.dp.record.app.failure");
             break;
         }

@@ -14,16 +14,11 @@ using platform::ActivityState;
 
 namespace {
 
-const platform::Log& log()
-{
-    return TavrinLogForCategory(kLogGeneral);
-}
-
 void run(const std::shared_ptr<const TavrinDPPeriodicTask>& task, const std::shared_ptr<platform::Activity>& activity,
          platform::Transactions& transactions)
 {
     const bool extended = TavrinXPCActivity::setState(ActivityState::Continue, *activity);
-    log().log("Running activity {}, extended={:d}", task->name(), extended);
+    log(kLogGeneral).log("Running activity {}, extended={:d}", task->name(), extended);
     task->queue()->async([task, activity, &transactions, extended] {
         {
             const auto transaction = transactions.begin(task->name());
@@ -31,7 +26,7 @@ void run(const std::shared_ptr<const TavrinDPPeriodicTask>& task, const std::sha
         }
         if (!extended) return;
         (void)TavrinXPCActivity::setState(ActivityState::Done, *activity);
-        log().log("Done running activity {}, extended={:d}", task->name(), extended);
+        log(kLogGeneral).log("Done running activity {}, extended={:d}", task->name(), extended);
     });
 }
 
@@ -44,7 +39,7 @@ TavrinDPPeriodicTaskManager::TavrinDPPeriodicTaskManager(Assembly& assembly)
 void TavrinDPPeriodicTaskManager::registerTask(std::shared_ptr<const TavrinDPPeriodicTask> task)
 {
     _queue->sync([&] { _allTasks[task->name()] = task; });
-    log().log("Registered CTS task {}", task->name());
+    log(kLogGeneral).log("Registered CTS task {}", task->name());
     TavrinXPCActivity::registerActivity(_assembly, task->name(), TavrinXPCCriteria::createCriteria(),
                                         [weak = std::weak_ptr(task), &transactions = _assembly.device.transactions](
                                             const std::shared_ptr<platform::Activity>& activity) {
@@ -52,7 +47,7 @@ void TavrinDPPeriodicTaskManager::registerTask(std::shared_ptr<const TavrinDPPer
                                             if (!self) return;
                                             const auto state = TavrinXPCActivity::getStateForActivity(*activity);
                                             if (state == ActivityState::CheckIn) {
-                                                log().log("Checking-in activity {}", self->name());
+                                                log(kLogGeneral).log("Checking-in activity {}", self->name());
                                                 activity->setCriteria(self->executionCriteria());
                                             } else if (state == ActivityState::Run) {
                                                 run(self, activity, transactions);

@@ -29,16 +29,11 @@ namespace {
 
 constexpr platform::Duration kUploadTimeout = 300s;
 constexpr std::size_t kMaximumPath = 1024;
-constexpr int kMaximumNameAttempts = 16;
+constexpr int kMaximumBodyFileAttempts = 16;
 
 // Limits of records that are sent on their own: they are in memory until the next pass, for ten minutes or longer.
 constexpr std::size_t kMaximumRecords = 1000;
 constexpr std::size_t kMaximumRecordBytes = 8u << 20; // of JSON text
-
-const platform::Log& log()
-{
-    return TavrinLogForCategory(kLogFlusher);
-}
 
 /// A record that is sent on its own: JSON made by its client.
 class CustomFeedbackToSend final : public Flushable {
@@ -64,7 +59,7 @@ makeTemporaryFile(platform::FileSystem& files, const std::filesystem::path& dire
         path = directory / (std::string(kUploadBodyPrefix) + platform::Uuid::random().string().substr(0, 6));
         if (path.native().size() >= kMaximumPath) return std::unexpected(platform::Error::posix(ENAMETOOLONG));
         auto file = files.createForAppending(path);
-        if (file || file.error().code != EEXIST || attempt == kMaximumNameAttempts) return file;
+        if (file || file.error().code != EEXIST || attempt == kMaximumBodyFileAttempts) return file;
     }
 }
 
@@ -109,7 +104,7 @@ TavrinFeedbackFlusher::TavrinFeedbackFlusher(Assembly& assembly, FlusherIdentity
           assembly.device.serialQueue("com.quorvane.tavrind.tavrinDataBufferQueue", platform::Priority::Background)),
       _feedbackCountQueue(assembly.device.serialQueue("com.quorvane.tavrind.feedbackCountQueue"))
 {
-    log().log("Initialize flusher for {}", convertIdentifierToString(identifier));
+    log(kLogFlusher).log("Initialize flusher for {}", convertIdentifierToString(identifier));
 }
 
 TavrinFeedbackFlusher::~TavrinFeedbackFlusher() = default;
@@ -131,8 +126,9 @@ void TavrinFeedbackFlusher::flush(std::shared_ptr<ZRCustomFeedback> record, std:
             const bool full =
                 self->_recordsBuffered == kMaximumRecords || size > kMaximumRecordBytes - self->_recordBytesBuffered;
             if (full) {
-                log().error("{} records of {} bytes are waiting, dropping one of {} bytes", self->_recordsBuffered,
-                            self->_recordBytesBuffered, size);
+                log(kLogFlusher)
+                    .error("{} records of {} bytes are waiting, dropping one of {} bytes", self->_recordsBuffered,
+                           self->_recordBytesBuffered, size);
             } else {
                 ++self->_recordsBuffered;
                 self->_recordBytesBuffered += size;
@@ -179,8 +175,8 @@ TavrinFeedbackFlusher::Bodies TavrinFeedbackFlusher::flushToWireSync()
 TavrinFeedbackFlusher::Bodies TavrinFeedbackFlusher::flushToWireWithObjectsReturned(bool returned)
 {
     _queueBuffer->assertOnQueue();
-    log().info("Sessions Flushed {}", _sessionBuffer.size());
-    if (!_serverEndpoint) log().error("Server endpoint not set, data can't be sent to server");
+    log(kLogFlusher).info("Sessions Flushed {}", _sessionBuffer.size());
+    if (!_serverEndpoint) log(kLogFlusher).error("Server endpoint not set, data can't be sent to server");
     Bodies bodies;
     _recordsBuffered = _recordBytesBuffered = 0;
     for (const auto& object : std::exchange(_sessionBuffer, {})) _flushObject(*object, returned ? &bodies : nullptr);
@@ -194,9 +190,9 @@ void TavrinFeedbackFlusher::_flushObject(Flushable& object, Bodies* bodies)
 
     std::filesystem::path fpath;
     auto file = makeTemporaryFile(_assembly.fileManager, _assembly.device.directories.temporary, fpath);
-    log().debug("flushing to {}", fpath.string());
+    log(kLogFlusher).debug("flushing to {}", fpath.string());
     if (!file) {
-        log().error("Error creating file to write feedbacks to disk");
+        log(kLogFlusher).error("Error creating file to write feedbacks to disk");
         return drop(FeedbackFate::NoBody);
     }
     CompressedOutputStream stream(std::make_unique<FileOutputStream>(std::move(*file)));
@@ -205,8 +201,9 @@ void TavrinFeedbackFlusher::_flushObject(Flushable& object, Bodies* bodies)
     stream.close();
     const auto error = stream.streamError();
     if (!count || error) { // the background activity removes the file later
-        log().error("Invalid JSON Object {} error {}", platform::Private{object.description()},
-                    error ? error->description() : "not a dictionary");
+        log(kLogFlusher)
+            .error("Invalid JSON Object {} error {}", platform::Private{object.description()},
+                   error ? error->description() : "not a dictionary");
         return drop(error ? FeedbackFate::NoBody : FeedbackFate::NotJson);
     }
 
@@ -217,17 +214,17 @@ void TavrinFeedbackFlusher::_flushObject(Flushable& object, Bodies* bodies)
     else
         drop(FeedbackFate::EndpointUnset);
     if (const auto removed = _assembly.fileManager.remove(fpath); removed)
-        log().debug("File removed {}", fpath.string());
+        log(kLogFlusher).debug("File removed {}", fpath.string());
     else
-        log().error("File Remove Error fpath {} error {}", fpath.string(), removed.error().description());
+        log(kLogFlusher).error("File Remove Error fpath {} error {}", fpath.string(), removed.error().description());
 }
 
 void TavrinFeedbackFlusher::_saveFile(const std::filesystem::path& fpath, Bodies& bodies)
 {
     const auto file = _assembly.fileManager.openForReading(fpath);
-    if (!file) return log().error("open failed {}", file.error().description());
+    if (!file) return log(kLogFlusher).error("open failed {}", file.error().description());
     auto body = mmapFileHandle(*file);
-    if (!body) return log().error("mmap failed {}", body.error().description());
+    if (!body) return log(kLogFlusher).error("mmap failed {}", body.error().description());
     bodies.push_back(std::move(*body));
 }
 
@@ -237,8 +234,9 @@ void TavrinFeedbackFlusher::_upload(const std::filesystem::path& fpath, const st
     auto task = _assembly.uploadURLSession->uploadTask(
         _assembly.requestFactory->flusherUploadRequest(*_serverEndpoint, kUploadTimeout, digest), fpath);
     if (!task) {
-        log().error("Error creating Upload Task for fpath {}. Exception {} occurred for reason {}", fpath.string(),
-                    task.error().domain, task.error().reason());
+        log(kLogFlusher)
+            .error("Error creating Upload Task for fpath {}. Exception {} occurred for reason {}", fpath.string(),
+                   task.error().domain, task.error().reason());
         return _assembly.feedbackBooks.move(FeedbackFate::Open, FeedbackFate::NoTask, events);
     }
     const auto feedbacks = static_cast<std::int64_t>(count);
@@ -299,14 +297,14 @@ void TavrinFeedbackFlusher::setEndpoint(std::optional<platform::Url> endpoint)
             endpoint = components.url();
         }
         self->_serverEndpoint = std::move(endpoint);
-        log().log("new endpoint: {}", self->_serverEndpoint ? self->_serverEndpoint->string() : "none");
+        log(kLogFlusher).log("new endpoint: {}", self->_serverEndpoint ? self->_serverEndpoint->string() : "none");
     });
 }
 
 /// Called inside the bag controller's barrier.
 void TavrinFeedbackFlusher::bagChangeNotification(const std::shared_ptr<const TAVBag>& bag)
 {
-    log().log("bag change notification received");
+    log(kLogFlusher).log("bag change notification received");
     if (bag) setEndpoint(_fetchEndpointFromBag(*bag));
 }
 

@@ -15,11 +15,6 @@ namespace tavrin {
 
 namespace {
 
-const platform::Log& log()
-{
-    return TavrinLogForCategory(kLogFlusher);
-}
-
 /// Passes the commands of one tool's connection to the bridge, with the tool's own proxy.
 class ToolConnection final : public TAVFlusherXPC {
 public:
@@ -46,7 +41,7 @@ std::shared_ptr<TavrinFlusherXPC> TavrinFlusherXPC::make(Assembly& assembly, Get
             if (const auto self = weak.lock()) self->_accept(connection);
         });
     bridge->_ipcListener->resume();
-    log().log("started accepting connections :{}", bridge->endpoint());
+    log(kLogFlusher).log("started accepting connections :{}", bridge->endpoint());
     return bridge;
 }
 
@@ -58,7 +53,7 @@ TavrinFlusherXPC::TavrinFlusherXPC(Assembly& assembly, GetClientConnections getC
 
 TavrinFlusherXPC::~TavrinFlusherXPC()
 {
-    log().log("stopped listening for TAVFlusherListener connections");
+    log(kLogFlusher).log("stopped listening for TAVFlusherListener connections");
 }
 
 std::string TavrinFlusherXPC::endpoint() const
@@ -70,11 +65,12 @@ void TavrinFlusherXPC::_accept(const std::shared_ptr<platform::ipc::Connection>&
 {
     const Tool tool = makeFlusherListenerProxy(connection);
     const auto commands = std::make_shared<ToolConnection>(weak_from_this(), tool);
-    connection->setPushErrorHandler([](const std::string& reason) { log().error("remote proxy error: {}", reason); });
+    connection->setPushErrorHandler(
+        [](const std::string& reason) { log(kLogFlusher).error("remote proxy error: {}", reason); });
     connection->exportObject(flusherHandler(commands));
     // The handler owns the connection and its exported object until the connection ends.
     connection->setInvalidationHandler([connection, commands, tool, weak = weak_from_this()] {
-        log().log("listener invalidated");
+        log(kLogFlusher).log("listener invalidated");
         if (const auto self = weak.lock()) self->_removeDelegate(tool);
     });
     _queue->async([self = shared_from_this(), tool] { self->_remoteObject = tool; });
@@ -86,7 +82,7 @@ void TavrinFlusherXPC::_removeDelegate(const Tool& tool)
     const auto remove = [&tool](Tool& role, const char* what) {
         if (role != tool) return;
         role = nullptr;
-        log().log("Removed {} listener", what);
+        log(kLogFlusher).log("Removed {} listener", what);
     };
     _queue->sync([&] {
         remove(_receivingStreamListener, "receiving stream");
@@ -104,32 +100,32 @@ void TavrinFlusherXPC::initiateConnectionWithIntent(std::uint64_t intent, std::s
     switch (static_cast<FlusherIntent>(intent)) {
     case FlusherIntent::WatchFlushes:
         assign(&TavrinFlusherXPC::_sendingStreamListener);
-        return log().log("new listener for flusher client sessions, delegate: {}", delegate);
+        return log(kLogFlusher).log("new listener for flusher client sessions, delegate: {}", delegate);
     case FlusherIntent::WatchEvents:
         assign(&TavrinFlusherXPC::_receivingStreamListener);
-        return log().log("new listener for client feedbacks, delegate: {}", delegate);
+        return log(kLogFlusher).log("new listener for client feedbacks, delegate: {}", delegate);
     case FlusherIntent::StopFlushing:
         assign(&TavrinFlusherXPC::_remoteObject);
-        log().log("flushing stopped; dump command will start flushing again");
+        log(kLogFlusher).log("flushing stopped; dump command will start flushing again");
         _assembly.backgroundFlusher->setStopFlushing(true);
         return tool->workDone();
     case FlusherIntent::Dump: assign(&TavrinFlusherXPC::_remoteObject); return _dump(tool);
     }
-    log().log("Unsupported command yet: {}", intent);
+    log(kLogFlusher).log("Unsupported command yet: {}", intent);
 }
 
 void TavrinFlusherXPC::_dump(const Tool& tool)
 {
     _queue->sync([&] {
         if (_sendingStreamListener) return;
-        log().log("no listener for sending stream setting this client as remote");
+        log(kLogFlusher).log("no listener for sending stream setting this client as remote");
         _sendingStreamListener = tool;
     });
     const auto flusher = _assembly.backgroundFlusher;
     platform::Group passes;
     for (const auto& connection : _getClientConnections ? _getClientConnections() : ClientConnections()) {
         connection->flushSession([flusher, agent = connection->userAgent(), pass = passes.enter()]() mutable {
-            log().log("session flushed because of dump command {}", agent);
+            log(kLogFlusher).log("session flushed because of dump command {}", agent);
             flusher->insertFlushActivity([pass = std::move(pass)] {});
         });
     }
@@ -155,7 +151,8 @@ void TavrinFlusherXPC::sendDataToReceivingStreamListener(const TavrinFeedback& f
     const bool logged = platform::Log::enabled(platform::LogLevel::Debug);
     if (!listener && !logged) return;
     const std::string description = feedback.description();
-    log().debug("id {} agent {} event {}", feedback.queryId, feedback.userAgent, platform::Private{description});
+    log(kLogFlusher)
+        .debug("id {} agent {} event {}", feedback.queryId, feedback.userAgent, platform::Private{description});
     if (listener) listener->receivedFeedbackDescription(description);
 }
 

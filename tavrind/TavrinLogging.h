@@ -31,5 +31,10 @@ enum TavrinLogCategory : unsigned {
 /// Returns the handle of a category; the first call creates all of them. An index out of range is a programming error
 /// and aborts the process. Any thread.
 [[nodiscard]] const platform::Log& TavrinLogForCategory(unsigned category);
+/// The same, in short.
+[[nodiscard]] inline const platform::Log& log(TavrinLogCategory category)
+{
+    return TavrinLogForCategory(category);
+}
 
 } // namespace tavrin

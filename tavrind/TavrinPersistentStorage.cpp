@@ -26,12 +26,7 @@ constexpr double kLargestLimit = 1e15;
 /// Limits of open and listed files, by `FileUse`; each open file takes a descriptor. One-off sessions have a separate
 /// limit, so that they never prevent the creation of a real session's file.
 constexpr std::array kMaximumFiles{2000, 100};
-constexpr int kMaximumNameAttempts = 16;
-
-const platform::Log& log()
-{
-    return TavrinLogForCategory(kLogFeedbackStorage);
-}
+constexpr int kMaximumSessionFileAttempts = 16;
 
 constexpr std::size_t index(FileUse use)
 {
@@ -82,10 +77,10 @@ TavrinPersistentStorage::~TavrinPersistentStorage() = default;
 
 void TavrinPersistentStorage::_scanCacheDirectory()
 {
-    if (_cachesUrl.empty()) return log().error("error scanning cache directory, could not get path");
+    if (_cachesUrl.empty()) return log(kLogFeedbackStorage).error("error scanning cache directory, could not get path");
     auto names = _assembly.fileManager.list(_cachesUrl);
     if (!names && names.error().code == ENOENT) names.emplace(); // no session was ever stored
-    if (!names) return log().error("error scanning cache directory {}", names.error().description());
+    if (!names) return log(kLogFeedbackStorage).error("error scanning cache directory {}", names.error().description());
     std::ranges::sort(*names, {}, [](const std::string& name) { return std::pair(sessionNumber(name), name); });
     std::int32_t largest = 0;
     for (const std::string& name : *names)
@@ -98,11 +93,11 @@ std::optional<std::int32_t> TavrinPersistentStorage::_adopt(const std::string& n
     const fs::path fileUrl = _cachesUrl / name;
     const auto attributes = _assembly.fileManager.info(fileUrl);
     if (!attributes) {
-        log().error("Attribute fetch error {}", attributes.error().description());
+        log(kLogFeedbackStorage).error("Attribute fetch error {}", attributes.error().description());
         return std::nullopt;
     }
     if (attributes->kind != platform::FileInfo::Kind::File) {
-        log().error("{} is not a regular file, ignoring it", fileUrl.string());
+        log(kLogFeedbackStorage).error("{} is not a regular file, ignoring it", fileUrl.string());
         return sessionNumber(name); // its number is in use
     }
     const auto container = std::make_shared<FileContainer>(_store, fileUrl);
@@ -123,7 +118,7 @@ void TavrinPersistentStorage::_settle()
     if (!isTooOld) return;
     _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.filetooold");
     if (const auto removed = _assembly.fileManager.remove(container->fileUrl()); !removed)
-        log().error("file removing error {}", removed.error().description());
+        log(kLogFeedbackStorage).error("file removing error {}", removed.error().description());
 }
 
 void TavrinPersistentStorage::_settleSoon()
@@ -139,7 +134,7 @@ std::optional<fs::path> TavrinPersistentStorage::_newFileUrl()
 {
     if (_cachesUrl.empty()) return std::nullopt;
     if (const auto made = _assembly.fileManager.createDirectories(_cachesUrl); !made) {
-        log().error("{}", made.error().description());
+        log(kLogFeedbackStorage).error("{}", made.error().description());
         return std::nullopt;
     }
     return _cachesUrl / (std::string(kPrefix) + std::to_string(_handleId++));
@@ -148,23 +143,23 @@ std::optional<fs::path> TavrinPersistentStorage::_newFileUrl()
 std::shared_ptr<FileContainer> TavrinPersistentStorage::createFileContainerForWriting(FileUse use)
 {
     if (_fileCounts[index(use)] >= kMaximumFiles[index(use)]) {
-        log().error("{} session files of this use exist, creating none", kMaximumFiles[index(use)]);
+        log(kLogFeedbackStorage).error("{} session files of this use exist, creating none", kMaximumFiles[index(use)]);
         return nullptr;
     }
     // Skips names that another process has used since the scan.
-    for (int attempt = 0; attempt < kMaximumNameAttempts; ++attempt) {
+    for (int attempt = 0; attempt < kMaximumSessionFileAttempts; ++attempt) {
         const auto fileUrl = _newFileUrl();
         if (!fileUrl) break;
         auto file = _assembly.fileManager.createForAppending(*fileUrl);
         if (file) {
-            log().debug("new file url {}", fileUrl->string());
+            log(kLogFeedbackStorage).debug("new file url {}", fileUrl->string());
             ++_fileCounts[index(use)];
             return std::make_shared<FileContainer>(_store, *fileUrl, std::move(*file), use);
         }
-        log().error("{}", file.error().description());
+        log(kLogFeedbackStorage).error("{}", file.error().description());
         if (file.error().code != EEXIST) break;
     }
-    log().error("Could not get a file url");
+    log(kLogFeedbackStorage).error("Could not get a file url");
     return nullptr;
 }
 
@@ -173,7 +168,7 @@ std::vector<std::shared_ptr<FileContainer>> TavrinPersistentStorage::getAvailabl
     return _queue->sync([this] {
         while (!_unsettled.empty()) _settle();
         for (const auto& container : _fileContainers)
-            log().debug("available file url {}", container->fileUrl().string());
+            log(kLogFeedbackStorage).debug("available file url {}", container->fileUrl().string());
         return _fileContainers;
     });
 }
@@ -195,10 +190,11 @@ void TavrinPersistentStorage::deleteSessionWithFileContainer(std::shared_ptr<Fil
         container->closeFile();
         const fs::path& fileUrl = container->fileUrl();
         if (fileUrl.empty())
-            return log().error("Handle {} does not have a File URL", static_cast<const void*>(container.get()));
-        log().debug("delete file url {}", fileUrl.string());
+            return log(kLogFeedbackStorage)
+                .error("Handle {} does not have a File URL", static_cast<const void*>(container.get()));
+        log(kLogFeedbackStorage).debug("delete file url {}", fileUrl.string());
         if (const auto removed = self->_assembly.fileManager.remove(fileUrl); !removed)
-            log().error("File {} delete failed", fileUrl.string());
+            log(kLogFeedbackStorage).error("File {} delete failed", fileUrl.string());
     });
 }
 
@@ -206,7 +202,7 @@ void TavrinPersistentStorage::syncDeletions()
 {
     _queue->sync([] {});
     if (const auto synced = _assembly.fileManager.syncDirectory(_cachesUrl); !synced)
-        log().error("deleted session files may come back: {}", synced.error().description());
+        log(kLogFeedbackStorage).error("deleted session files may come back: {}", synced.error().description());
 }
 
 } // namespace tavrin

@@ -25,15 +25,6 @@ namespace tavrin {
 using platform::Value;
 namespace ipc = platform::ipc;
 
-namespace {
-
-const platform::Log& log()
-{
-    return TavrinLogForCategory(kLogConnection);
-}
-
-} // namespace
-
 std::shared_ptr<TavrinService> TavrinService::make(Assembly& assembly)
 {
     auto service = std::make_shared<TavrinService>(assembly);
@@ -58,7 +49,7 @@ std::optional<std::string> TavrinService::clientIDForConnection(platform::Proces
     if (auto application = processes.applicationId(pid)) return application;
     const auto path = processes.executablePath(pid);
     if (!path) {
-        log().error("error getting path for pid [{}] {}", pid, path.error().reason());
+        log(kLogConnection).error("error getting path for pid [{}] {}", pid, path.error().reason());
         return std::nullopt;
     }
     return path->substr(path->find_last_of('/') + 1);
@@ -74,10 +65,11 @@ void TavrinService::_accept(const std::shared_ptr<ipc::Connection>& connection)
 {
     const pid_t pid = connection->peer().pid;
     const std::string clientId = clientIDForConnection(_assembly.device.processes, pid).value_or("none");
-    log().log("new connection from {} ({})", clientId, pid);
+    log(kLogConnection).log("new connection from {} ({})", clientId, pid);
 
-    connection->setPushErrorHandler(
-        [pid](const std::string& reason) { log().error("(pid:{}) remote proxy error: {}", pid, reason); });
+    connection->setPushErrorHandler([pid](const std::string& reason) {
+        log(kLogConnection).error("(pid:{}) remote proxy error: {}", pid, reason);
+    });
     auto client = std::make_shared<ClientConnection>(_assembly, makeClientProxy(connection), connection);
     connection->exportObject(daemonHandler(client, weak_from_this()));
     connection->setInvalidationHandler([weak = weak_from_this(), weakClient = std::weak_ptr(client), clientId, pid] {
@@ -89,7 +81,7 @@ void TavrinService::_accept(const std::shared_ptr<ipc::Connection>& connection)
         self->_connections.push_back(client);
         const auto samePid = std::ranges::count_if(
             self->_connections, [pid](const auto& other) { return other->connection()->peer().pid == pid; });
-        if (samePid >= 2) log().error("too many connections {} from pid {}", samePid, pid);
+        if (samePid >= 2) log(kLogConnection).error("too many connections {} from pid {}", samePid, pid);
     });
     _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.clientconnection");
     connection->resume();
@@ -99,11 +91,11 @@ void TavrinService::_accept(const std::shared_ptr<ipc::Connection>& connection)
 void TavrinService::_connectionInvalidated(const std::shared_ptr<ClientConnection>& connection,
                                            const std::string& clientId, pid_t pid)
 {
-    log().log("connection from {} ({}) invalidated", clientId, pid);
+    log(kLogConnection).log("connection from {} ({}) invalidated", clientId, pid);
     const auto shortName = connection->clientShortName();
     _queue->async([self = shared_from_this(), connection] {
         connection->flushSessionInvalidation([self, connection](bool flushed) {
-            TavrinLogForCategory(kLogSession).debug("session {} on invalidation", flushed ? "flushed" : "not flushed");
+            log(kLogSession).debug("session {} on invalidation", flushed ? "flushed" : "not flushed");
             self->_queue->async([self, connection] { std::erase(self->_connections, connection); });
         });
     });

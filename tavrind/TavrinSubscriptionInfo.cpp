@@ -18,11 +18,6 @@ namespace {
 
 constexpr std::size_t kMaximumLength = 64u << 10;
 
-const platform::Log& log()
-{
-    return TavrinLogForCategory(kLogSubscription);
-}
-
 /// Returns a finite number, given as a number or as text.
 std::optional<double> secondsIn(const Value& value)
 {
@@ -42,7 +37,8 @@ std::optional<Dictionary> TavrinSubscriptionInfo::dictionaryWithKeyValuePairList
 {
     if (text.empty()) return std::nullopt;
     if (text.size() > kMaximumLength) {
-        log().error("Subscription information is {} bytes long, more than {}", text.size(), kMaximumLength);
+        log(kLogSubscription)
+            .error("Subscription information is {} bytes long, more than {}", text.size(), kMaximumLength);
         return std::nullopt;
     }
     Dictionary pairs;
@@ -52,17 +48,20 @@ std::optional<Dictionary> TavrinSubscriptionInfo::dictionaryWithKeyValuePairList
         begin = end + 1;
         const std::size_t equals = pair.find('=');
         if (equals == std::string_view::npos) {
-            log().error("Subscription information contained invalid key-value pair {} (full string: {})", pair, text);
+            log(kLogSubscription)
+                .error("Subscription information contained invalid key-value pair {} (full string: {})", pair, text);
             return std::nullopt;
         }
         std::string key(platform::trimmed(pair.substr(0, equals)));
         const std::string_view value = platform::trimmed(pair.substr(equals + 1));
         if (key.empty() || value.empty()) {
-            log().error("Subscription information contained empty key or value (full string: {})", text);
+            log(kLogSubscription)
+                .error("Subscription information contained empty key or value (full string: {})", text);
             return std::nullopt;
         }
         if (pairs.contains(key)) {
-            log().error("Subscription information contained duplicate key {} (full string: {})", key, text);
+            log(kLogSubscription)
+                .error("Subscription information contained duplicate key {} (full string: {})", key, text);
             return std::nullopt;
         }
         pairs.set(std::move(key), value);
@@ -81,8 +80,9 @@ std::optional<TavrinSubscriptionInfo> TavrinSubscriptionInfo::withDictionary(con
 {
     TavrinSubscriptionInfo info;
     const auto refuse = [&](const char* key, const Value* value) {
-        log().error("Subscription information contained invalid '{}': {} (full dictionary: {})", key,
-                    platform::toJson(value ? *value : Value()), platform::toJson(dictionary));
+        log(kLogSubscription)
+            .error("Subscription information contained invalid '{}': {} (full dictionary: {})", key,
+                   platform::toJson(value ? *value : Value()), platform::toJson(dictionary));
         return std::nullopt;
     };
     if (const Value* expires = dictionary.find("expires")) {

@@ -17,11 +17,6 @@ namespace {
 
 constexpr const char* kFuse = "fuse";
 
-const platform::Log& log()
-{
-    return TavrinLogForCategory(kLogSubscription);
-}
-
 } // namespace
 
 std::string subscriptionsHeader(const std::vector<Value>& subscriptions)
@@ -31,8 +26,9 @@ std::string subscriptionsHeader(const std::vector<Value>& subscriptions)
     for (const Value& subscription : subscriptions) {
         const std::string entry = (header.empty() ? "[" : ",") + platform::toJson(subscription);
         if (header.size() + entry.size() + 1 > kLongest)
-            log().error("not sending the subscription with {}: the header has at most {} bytes",
-                        platform::toJson(subscription["provider"]), kLongest);
+            log(kLogSubscription)
+                .error("not sending the subscription with {}: the header has at most {} bytes",
+                       platform::toJson(subscription["provider"]), kLongest);
         else
             header += entry;
     }
@@ -103,7 +99,7 @@ void TavrinSubscriptionManager::_updateStorefrontIdentifier(const std::optional<
 void TavrinSubscriptionManager::_updateSubscriptions()
 {
     _queue->assertOnQueue();
-    log().info("updating subscriptions");
+    log(kLogSubscription).info("updating subscriptions");
     const auto domains = _bag ? _bag->subscriptionProviderDomainWhitelist() : std::nullopt;
     const auto bundles = _bag ? _bag->subscriptionProviderBundleIdentifierWhitelist() : std::nullopt;
     if (!domains || !bundles) {
@@ -116,8 +112,9 @@ void TavrinSubscriptionManager::_updateSubscriptions()
          .domains = *domains,
          .maximumExpiration = platform::durationFromSeconds(_bag->subscriptionTTL())});
     if (!services)
-        log().error("Error fetching third party subscription information from daemon: {}",
-                    services.error().description());
+        log(kLogSubscription)
+            .error("Error fetching third party subscription information from daemon: {}",
+                   services.error().description());
     std::map<std::string, Value> all = services ? std::move(*services) : std::map<std::string, Value>();
     all[kFuse] = Value::dictionaryOf(
         {{"provider", kFuse}, {"attribute", "premium"}, {"active", _assembly.device.profile.profile().newsSubscribed}});

@@ -5,12 +5,13 @@
 #include <openssl/evp.h>
 #include <zlib.h>
 
+#include "tavrind/encoder.h"
+
 namespace tavrin {
 
 namespace {
 
 constexpr std::size_t kHeader = 8;
-constexpr std::size_t kDigestTail = 4;
 
 std::size_t bigEndian(std::string_view bytes)
 {

@@ -13,7 +13,6 @@ namespace tavrin {
 namespace {
 
 constexpr std::size_t kLongestRun = 256; // bits: a run's length less 1 is one byte
-constexpr std::size_t kDigestTail = 4;
 
 char byteOf(std::size_t value, unsigned shift)
 {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
 #include <optional>
 #include <span>
@@ -13,6 +14,9 @@ namespace tavrin {
 
 /// The largest number that a signature can hold: the bitmap's length has 16 bits.
 inline constexpr std::uint32_t kMaximumEncodingId = 524'279;
+
+/// How many bytes of the bitmap's MD5 digest, from its end, precede the payload.
+inline constexpr std::size_t kDigestTail = 4;
 
 /// Returns a bitmap with bit n set for every n of `ids`, counted from the most significant bit of the first byte. `ids`
 /// are in ascending order and at most kMaximumEncodingId. The length in bytes is the largest id divided by 8, rounded

@@ -30,11 +30,6 @@ CREATE INDEX app_activity_start ON app_activity (start);
 PRAGMA user_version = 1;
 )";
 
-std::unexpected<Error> failure(std::string reason)
-{
-    return std::unexpected(Error::withReason(std::string(kFormatErrorDomain), kFormatMalformed, std::move(reason)));
-}
-
 Result<std::int64_t> versionOf(Sqlite& database)
 {
     std::int64_t version = 0;
@@ -62,7 +57,7 @@ Result<std::vector<AppActivity>> AppActivities::queryAppActivitiesAfterDate(Date
     if (!database) return std::unexpected(std::move(database.error()));
     const auto version = versionOf(*database);
     if (!version) return std::unexpected(version.error());
-    if (*version != kVersion) return failure(fmt::format("{} has version {}", _path.string(), *version));
+    if (*version != kVersion) return malformed(fmt::format("{} has version {}", _path.string(), *version));
 
     std::vector<AppActivity> activities;
     const auto atMost = std::min<std::size_t>(limit, std::numeric_limits<std::int64_t>::max());
@@ -86,7 +81,7 @@ Result<void> AppActivities::add(const AppActivity& activity, Date now) const
 {
     const auto start = std::chrono::floor<seconds>(activity.start);
     const auto oldest = std::chrono::floor<seconds>(now) - kKeptFor;
-    if (start < oldest) return failure("the activity began more than seven days ago");
+    if (start < oldest) return malformed("the activity began more than seven days ago");
 
     if (auto made = _files.createDirectories(_path.parent_path()); !made) return made;
     auto database = _files.openDatabase(_path, Sqlite::Access::Shared);
@@ -95,7 +90,7 @@ Result<void> AppActivities::add(const AppActivity& activity, Date now) const
         const auto version = versionOf(*database);
         if (!version) return std::unexpected(version.error());
         if (*version != 0 && *version != kVersion)
-            return failure(fmt::format("{} has version {}", _path.string(), *version));
+            return malformed(fmt::format("{} has version {}", _path.string(), *version));
         if (*version == 0)
             if (auto made = database->execute(kTable); !made) return made;
         if (auto forgotten =

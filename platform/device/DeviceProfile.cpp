@@ -15,7 +15,7 @@ namespace platform {
 
 namespace {
 
-constexpr std::size_t kMaximumSize = 1u << 20;
+constexpr std::size_t kMaximumProfileSize = 1u << 20;
 constexpr double kSmallestScale = 0.5;
 constexpr double kLargestScale = 8;
 
@@ -56,13 +56,13 @@ public:
 private:
     DeviceProfile read()
     {
-        const auto bytes = _files.read(_path, kMaximumSize);
+        const auto bytes = _files.read(_path, kMaximumProfileSize);
         if (!bytes) {
             if (bytes.error().code != ENOENT)
                 defaultLog().error("device.json can't be read: {}", bytes.error().description());
             return {};
         }
-        const auto value = parseJson(bytes->view(), kMaximumSize);
+        const auto value = parseJson(bytes->view(), kMaximumProfileSize);
         if (!value) defaultLog().error("device.json is broken: {}", value.error().description());
         return value ? deviceProfileFromValue(*value) : DeviceProfile();
     }

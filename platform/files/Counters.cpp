@@ -28,7 +28,7 @@ constexpr std::size_t kMaximumCounters = 4096;
 constexpr std::size_t kEvicted = kMaximumCounters / 8;
 constexpr std::size_t kMaximumKeyLength = 512;
 /// The size of the largest file that can be written: all keys consist of escapes ("\u0001"), all numbers of 20 digits.
-constexpr std::size_t kMaximumSize = kMaximumCounters * (6 * kMaximumKeyLength + 32);
+constexpr std::size_t kMaximumCountersSize = kMaximumCounters * (6 * kMaximumKeyLength + 32);
 
 struct KeyHash {
     using is_transparent = void;
@@ -117,13 +117,13 @@ struct CounterStore::Impl : std::enable_shared_from_this<Impl> {
 
     void load()
     {
-        auto bytes = files->read(path, kMaximumSize);
+        auto bytes = files->read(path, kMaximumCountersSize);
         if (!bytes) {
             if (bytes.error().code != ENOENT)
                 defaultLog().error("counters can't be read: {}", bytes.error().description());
             return;
         }
-        const auto contents = parseJson(bytes->view(), kMaximumSize);
+        const auto contents = parseJson(bytes->view(), kMaximumCountersSize);
         if (!contents || !contents->asDictionary())
             return defaultLog().error("counters {} are broken, starting at 0", path.string());
         std::unique_lock lock(mutex);

@@ -18,7 +18,7 @@ namespace platform {
 namespace fs = std::filesystem;
 
 namespace {
-constexpr std::size_t kMaximumSize = 4u << 20;
+constexpr std::size_t kMaximumSuiteSize = 4u << 20;
 /// Number and interval of attempts to take a lock that another process holds.
 constexpr int kLockAttempts = 20;
 constexpr std::chrono::milliseconds kLockDelay(100);
@@ -43,10 +43,10 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
     /// Returns the file's values, none if it is missing. Fails if it can't be read or isn't a JSON object.
     Result<Dictionary> readFile() const
     {
-        auto bytes = files->read(path, kMaximumSize);
+        auto bytes = files->read(path, kMaximumSuiteSize);
         if (!bytes && bytes.error().domain == kPosixErrorDomain && bytes.error().code == ENOENT) return Dictionary();
         if (!bytes) return std::unexpected(std::move(bytes.error()));
-        auto value = parseJson(bytes->view(), kMaximumSize);
+        auto value = parseJson(bytes->view(), kMaximumSuiteSize);
         if (!value) return std::unexpected(std::move(value.error()));
         if (!value->asDictionary())
             return std::unexpected(Error::withReason(std::string(kFormatErrorDomain), 1, "not a JSON object"));
@@ -125,8 +125,8 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
             fileIsBroken = false;
         }
         const std::string text = toJson(merged, JsonStyle::Pretty) + "\n";
-        const auto done = text.size() <= kMaximumSize ? files->writeAtomically(path, text)
-                                                      : Result<void>(std::unexpected(Error::posix(EFBIG)));
+        const auto done = text.size() <= kMaximumSuiteSize ? files->writeAtomically(path, text)
+                                                           : Result<void>(std::unexpected(Error::posix(EFBIG)));
         if (done) return {};
         std::lock_guard lock(mutex);
         dirty.merge(written);

@@ -16,7 +16,7 @@ namespace platform::ipc {
 namespace {
 
 /// Replies may be as large as sd-bus allows.
-constexpr std::size_t kMaximumAnswer = 128u << 20;
+constexpr std::size_t kMaximumPeerAnswer = 128u << 20;
 
 std::uint64_t monotonicMicroseconds()
 {
@@ -52,7 +52,7 @@ CallResult decodeAs(sd_bus_message* message, std::string_view signature)
     if (!actual || signature != actual)
         return std::unexpected(CallError{SD_BUS_ERROR_INVALID_SIGNATURE, fmt::format("the answer is \"{}\", not \"{}\"",
                                                                                      actual ? actual : "", signature)});
-    auto decoded = decodeArguments(message, kMaximumAnswer);
+    auto decoded = decodeArguments(message, kMaximumPeerAnswer);
     if (!decoded) return std::unexpected(std::move(decoded.error()));
     return std::move(decoded->message);
 }
@@ -89,7 +89,7 @@ struct Client::Impl {
         const char* member = sd_bus_message_get_member(message);
         if (!signalHandler || !interface || !member || std::strcmp(interface, "org.freedesktop.DBus.Local") == 0)
             return;
-        if (auto decoded = decodeArguments(message, kMaximumAnswer))
+        if (auto decoded = decodeArguments(message, kMaximumPeerAnswer))
             signalHandler(interface, member, std::move(decoded->message));
     }
 

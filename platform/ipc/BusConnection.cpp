@@ -10,14 +10,12 @@
 #include <fmt/format.h>
 #include <systemd/sd-bus.h>
 
-#include "platform/base/Log.h"
 #include "platform/ipc/BusStandardCalls.h"
+#include "platform/ipc/IpcLog.h"
 
 namespace platform::ipc {
 
 namespace {
-
-const Log kLog("platform", "ipc");
 
 /// Steps in one go, before other connections and the loop's jobs run. A message takes one or two.
 constexpr unsigned kStepsPerTurn = 64;

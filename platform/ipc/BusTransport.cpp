@@ -7,15 +7,13 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
-#include "platform/base/Log.h"
 #include "platform/ipc/BusConnection.h"
+#include "platform/ipc/IpcLog.h"
 #include "platform/ipc/ListenSocket.h"
 
 namespace platform::ipc {
 
 namespace {
-
-const Log kLog("platform", "ipc");
 
 constexpr std::string_view kEndpointPrefix = "endpoint-";
 

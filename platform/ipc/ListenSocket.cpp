@@ -13,13 +13,11 @@
 #include <fmt/format.h>
 #include <systemd/sd-daemon.h>
 
-#include "platform/base/Log.h"
+#include "platform/ipc/IpcLog.h"
 
 namespace platform::ipc {
 
 namespace {
-
-const Log kLog("platform", "ipc");
 
 std::unexpected<Error> failure(int errnum, const std::filesystem::path& path)
 {

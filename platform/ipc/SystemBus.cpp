@@ -14,7 +14,7 @@ namespace {
 
 constexpr const char* kProperties = "org.freedesktop.DBus.Properties";
 /// Far more than any reply of the services in use.
-constexpr std::size_t kMaximumAnswer = 1u << 20;
+constexpr std::size_t kMaximumSystemAnswer = 1u << 20;
 
 /// Returns the error of a reply, or nothing. `message` is null if the call could not be sent.
 std::optional<CallError> errorOf(sd_bus_message* message)
@@ -28,7 +28,7 @@ std::optional<CallError> errorOf(sd_bus_message* message)
 CallResult argumentsOf(sd_bus_message* message)
 {
     if (auto error = errorOf(message)) return std::unexpected(std::move(*error));
-    auto decoded = decodeArguments(message, kMaximumAnswer);
+    auto decoded = decodeArguments(message, kMaximumSystemAnswer);
     if (!decoded) return std::unexpected(std::move(decoded.error()));
     return std::move(decoded->message);
 }

@@ -16,7 +16,6 @@ namespace platform {
 
 namespace {
 
-constexpr std::string_view kClassKey = "class";
 constexpr std::int8_t kTimestamp = -1;
 constexpr std::int64_t kNanosecondsPerSecond = 1'000'000'000;
 

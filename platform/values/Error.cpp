@@ -29,4 +29,9 @@ std::string Error::description() const
     return text.empty() ? fmt::format("{} {}", domain, code) : fmt::format("{} {}: {}", domain, code, text);
 }
 
+std::unexpected<Error> malformed(std::string reason)
+{
+    return std::unexpected(Error::withReason(std::string(kFormatErrorDomain), kFormatMalformed, std::move(reason)));
+}
+
 } // namespace platform

@@ -47,6 +47,8 @@ inline constexpr std::string_view kFormatErrorDomain = "Format";
 inline constexpr std::int64_t kFormatMalformed = 1;
 /// Code: a record is of a class that the reader doesn't know.
 inline constexpr std::int64_t kFormatUnknownClass = 2;
+/// Returns an error of kFormatErrorDomain with code kFormatMalformed.
+[[nodiscard]] std::unexpected<Error> malformed(std::string reason);
 /// The domain of system call errors. Codes are `errno` values.
 inline constexpr std::string_view kPosixErrorDomain = "POSIX";
 

@@ -28,11 +28,6 @@ constexpr std::size_t kKeptParserCapacity = 64u << 10;
 
 thread_local std::unique_ptr<dom::parser> keptParser;
 
-std::unexpected<Error> malformed(std::string reason)
-{
-    return std::unexpected(Error::withReason(std::string(kFormatErrorDomain), kFormatMalformed, std::move(reason)));
-}
-
 /// Returns true if containers nest deeper than `levels`. Unlike the parser, counts empty containers too.
 bool nestsDeeper(dom::element element, std::size_t levels)
 {

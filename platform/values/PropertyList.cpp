@@ -23,11 +23,6 @@ namespace {
 /// 2001-01-01 00:00 UTC, from which property list dates count, in seconds since 1970.
 constexpr std::int64_t kEpoch = 978307200;
 
-std::unexpected<Error> malformed(std::string reason)
-{
-    return std::unexpected(Error::withReason(std::string(kFormatErrorDomain), kFormatMalformed, std::move(reason)));
-}
-
 // Reading
 
 /// Parses one file:

@@ -62,6 +62,9 @@ public:
 
 class RecordClasses;
 
+/// The key of a record's class name in archives and in IPC dictionaries.
+inline constexpr std::string_view kClassKey = "class";
+
 /// Reads the values of a record. Each read consumes the next value and fails if it is of another type. After the first
 /// failure all reads return zero or an empty value, so that callers check once, at the end.
 class Decoder {

@@ -7,8 +7,6 @@ namespace platform {
 
 namespace {
 
-constexpr std::string_view kClassKey = "class";
-
 /// Builds a dictionary from a record.
 class ValueEncoder final : public Encoder {
 public:

@@ -116,7 +116,7 @@ void add(const Options& options, const ActivityOptions& mine)
     if (!mine.isPublic) printLine("The daemon never records an activity that is not public; use --public.");
 }
 
-void list(const Options& options)
+void listActivities(const Options& options)
 {
     const auto files = platform::makeSystemFiles();
     auto activities =
@@ -159,7 +159,7 @@ void addActivityCommands(CLI::App& app, Command& chosen)
     adding->callback([&chosen, options] { chosen = [options](const Options& common) { add(common, *options); }; });
 
     activity->add_subcommand("list", "List the activities of the last days, the latest last; at most --limit")
-        ->callback([&chosen] { chosen = list; });
+        ->callback([&chosen] { chosen = listActivities; });
 }
 
 } // namespace tavrin::ctl

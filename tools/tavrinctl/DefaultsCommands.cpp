@@ -106,7 +106,7 @@ void read(const Options& options, const std::string& suite, const std::string& k
     printLine(text ? printable(*text) : platform::toJson(*value, platform::JsonStyle::Pretty));
 }
 
-void list(const Options& options)
+void listDefaults(const Options& options)
 {
     if (options.json) {
         Value::Array keys;
@@ -165,7 +165,7 @@ void addDefaultsCommands(CLI::App& app, Command& chosen)
         ->required();
 
     add("list", "List the settings and their effects",
-        [](const Options& common, const DefaultsOptions&) { list(common); });
+        [](const Options& common, const DefaultsOptions&) { listDefaults(common); });
 }
 
 } // namespace tavrin::ctl

@@ -107,7 +107,7 @@ void send(const Options& options, const std::string& file)
         throw Failure(fmt::format("the daemon refused {} events: {}", events.size() - taken, refusal));
 }
 
-void list(const Options& options)
+void listEvents(const Options& options)
 {
     const Value::Array events = valueOf(openSession(options).client->feedback());
     if (options.json) return printJson(events);
@@ -137,7 +137,7 @@ void addFeedbackCommands(CLI::App& app, Command& chosen)
     feedback->require_subcommand(0, 1);
     // Runs after the callbacks of its subcommands.
     feedback->callback([&chosen, feedback] {
-        if (feedback->get_subcommands().empty()) chosen = list;
+        if (feedback->get_subcommands().empty()) chosen = listEvents;
     });
 
     CLI::App* sendCommand = feedback->add_subcommand("send", "Report events as a client does");
