@@ -36,6 +36,7 @@ constexpr std::array kKnownKeys{
     KnownKey{"TAVNoQueryCache", "boolean", "no answers from memory"},
     KnownKey{"TAVNoParallax", "boolean", "no TCP Fast Open, no TLS session tickets; read at start"},
     KnownKey{"TAVDebugParameters", "string", "name=value&… for every request; read at start"},
+    KnownKey{"TAVLogPrivateData", "boolean", "the log shows what users typed and saw; read at start"},
     KnownKey{"TAVDownloadDelay", "number", "seconds until a resource is downloaded; for development"},
     KnownKey{"TraceEnabled", "boolean", "trace points; read at start"},
 };
