@@ -216,10 +216,9 @@ void ClientConnection::reportEvent(const std::string&, std::int64_t queryId, std
 void ClientConnection::reportEvent(std::shared_ptr<ZRFeedback> feedback, std::int64_t queryId,
                                    std::shared_ptr<void> call)
 {
-    const platform::Log& log = tavrin::log(kLogFeedback);
     if (!_state) {
         if (!_reportedNoState.exchange(true)) _reportOneOff(makeTAVError(TAVErrorInvalidResponse, "client state nil"));
-        return log.error("state must not be nil");
+        return log(kLogFeedback).error("state must not be nil");
     }
     if (auto custom = std::dynamic_pointer_cast<ZRCustomFeedback>(feedback)) {
         return handleCustomFeedback(std::move(custom), queryId,
@@ -233,7 +232,7 @@ void ClientConnection::reportEvent(std::shared_ptr<ZRFeedback> feedback, std::in
     const auto manager = _state->sessionManager();
     if (!manager) {
         _reportOneOff(makeTAVError(TAVErrorInvalidResponse, "session manager nil"));
-        return log.error("session manager nil");
+        return log(kLogFeedback).error("session manager nil");
     }
     const std::uint64_t clientQueryId = feedbackClassOf(*feedback).clientQueryId(*feedback);
 
