@@ -12,7 +12,8 @@ using Date = std::chrono::sys_time<std::chrono::nanoseconds>;
 /// A span of time.
 using Duration = std::chrono::nanoseconds;
 
-// Conversions treat whole seconds and the fraction separately: a double can't hold nanoseconds since 1970 exactly.
+// Conversions treat whole seconds and the fraction separately: a double can't hold nanoseconds since 1970 exactly. Pure
+// functions: any thread.
 
 /// Returns the number of seconds in `d`, rounded to the nearest double.
 [[nodiscard]] inline double toSeconds(Duration d)

@@ -76,6 +76,7 @@ struct ActivityEnvironment {
     std::filesystem::path file; ///< has the due times; read with the first registration, created with the first run
 };
 
+/// Returns a scheduler. Destroying it cancels its timer; running handlers are not interrupted.
 [[nodiscard]] std::unique_ptr<ActivityScheduler> makeActivityScheduler(ActivityEnvironment environment);
 
 } // namespace platform

@@ -22,6 +22,7 @@ public:
     [[nodiscard]] virtual Result<std::string> executablePath(pid_t pid) = 0;
 };
 
+/// Returns the implementation for the real /proc.
 [[nodiscard]] std::unique_ptr<ProcessIdentity> makeProcessIdentity();
 
 /// Returns the application's name from the text of a .flatpak-info file; nothing if it has none.

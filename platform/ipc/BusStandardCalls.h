@@ -4,7 +4,7 @@
 
 /// The calls that every D-Bus object supports, and those that clients send to a message bus first (Hello, AddMatch, …),
 /// so that tools and bindings of other languages can connect as they do to a message bus. Every bus name counts as this
-/// service's, and the service counts as running.
+/// service's, and the service counts as running. Call these only on the thread that uses the message's bus.
 namespace platform::ipc {
 
 /// The unique names of the two ends, as on a message bus with one peer. Every message to a peer has both: some bindings

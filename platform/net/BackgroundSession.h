@@ -124,6 +124,7 @@ struct BackgroundEnvironment {
     std::filesystem::path temporary; ///< for a session whose store can't be opened
 };
 
+/// Returns sessions that transfer with `environment.loader`.
 [[nodiscard]] std::unique_ptr<BackgroundSessions> makeBackgroundSessions(BackgroundEnvironment environment);
 
 } // namespace platform

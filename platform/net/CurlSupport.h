@@ -12,6 +12,8 @@ namespace platform {
 
 struct UrlSessionConfiguration;
 
+// Helpers of the loader. Any thread, except for `timingDataOf`.
+
 /// Returns an error in kUrlErrorDomain.
 [[nodiscard]] Error urlError(std::int64_t code, std::string reason);
 /// Maps libcurl's result to an error in kUrlErrorDomain. `detail` is libcurl's error text; null or empty if none.
@@ -34,7 +36,7 @@ struct LoadMarks {
     double hop = 0;         ///< of the last request, after redirects and after a retry on a new connection
 };
 /// Returns the timing data of a finished load; docs/timing.md lists the keys. `easy` must be the handle of its last
-/// request.
+/// request. Loader's thread.
 [[nodiscard]] Value timingDataOf(CURL* easy, const LoadMarks& marks);
 
 } // namespace platform

@@ -5,7 +5,7 @@
 
 namespace platform {
 
-/// Returns true if the text, without ":", has the form of a URL scheme (RFC 3986, 3.1).
+/// Returns true if the text, without ":", has the form of a URL scheme (RFC 3986, 3.1). Any thread.
 [[nodiscard]] inline bool isUrlScheme(std::string_view text)
 {
     const auto isLetter = [](char c) { return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z'); };
