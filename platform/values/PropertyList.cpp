@@ -256,7 +256,7 @@ private:
             Value key;
             Value entry;
             if (!readReference(position, i, depth, key)) return false;
-            if (!key.asString()) return fail("key that is no string");
+            if (!key.asString()) return fail("key that is not a string");
             if (!readReference(position, length + i, depth, entry)) return false;
             dictionary.set(*key.asString(), std::move(entry));
         }
