@@ -184,7 +184,7 @@ void ImageLoader::_fetchImageURL(const Url& url, std::optional<platform::Duratio
     if (cache && cache->find(url)) return log(kLogImages).log("found {} in cache", Private{url.string()});
     if (!_imageFetches.add({url, timeoutInterval, source}, group))
         return log(kLogImages)
-            .error("{} images are waiting, not fetching {}", ImageFetches::kWaiting, Private{url.string()});
+            .error("{} images wait already, not fetching {}", ImageFetches::kWaiting, Private{url.string()});
     _startImageFetches();
 }
 

@@ -27,7 +27,7 @@ std::string subscriptionsHeader(const std::vector<Value>& subscriptions)
         const std::string entry = (header.empty() ? "[" : ",") + platform::toJson(subscription);
         if (header.size() + entry.size() + 1 > kLongest)
             log(kLogSubscription)
-                .error("not sending the subscription with {}: the header has at most {} bytes",
+                .error("subscription with {} is not sent: the header has at most {} bytes",
                        platform::toJson(subscription["provider"]), kLongest);
         else
             header += entry;
