@@ -159,7 +159,7 @@ void BackgroundActivitiesManager::_findUpload(const platform::BackgroundTask& ta
 {
     const UploadNote note = UploadNote::from(task.note());
     if (note.process == _assembly.feedbackBooks.process()) return;
-    const std::lock_guard lock(_foundMutex);
+    const platform::MutexLock lock(_foundMutex);
     if (_found.insert(task.identifier()).second) _assembly.feedbackBooks.find(FeedbackFate::Uploading, note.events);
 }
 

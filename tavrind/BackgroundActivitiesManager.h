@@ -6,6 +6,7 @@
 #include <mutex>
 #include <set>
 
+#include "platform/base/Mutex.h"
 #include "platform/net/BackgroundSession.h"
 
 namespace platform {
@@ -61,8 +62,8 @@ private:
     std::shared_ptr<platform::Queue> _queueFlusher;
     std::shared_ptr<TavrinFeedbackFlusher> _feedbackFlusher;
     std::atomic<bool> _stopFlushing = false;
-    std::mutex _foundMutex;
-    std::set<std::uint64_t> _found; ///< tasks of earlier processes that are in the books
+    platform::Mutex _foundMutex;
+    std::set<std::uint64_t> _found GUARDED_BY(_foundMutex); ///< tasks of earlier processes that are in the books
 };
 
 } // namespace tavrin

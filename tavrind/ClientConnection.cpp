@@ -54,13 +54,13 @@ ClientConnection::~ClientConnection() = default;
 
 std::shared_ptr<ClientState> ClientConnection::_boundState() const
 {
-    std::lock_guard lock(_mutex);
+    platform::MutexLock lock(_mutex);
     return _state;
 }
 
 std::string ClientConnection::userAgent() const
 {
-    std::lock_guard lock(_mutex);
+    platform::MutexLock lock(_mutex);
     return _configuration ? _configuration->userAgent.value_or("") : "";
 }
 
@@ -70,21 +70,28 @@ std::optional<std::string> ClientConnection::clientShortName() const
     return state ? state->clientShortName() : std::nullopt;
 }
 
-void ClientConnection::_ensureState()
+std::shared_ptr<ClientState> ClientConnection::_ensureState()
 {
     const platform::Log& log = tavrin::log(kLogSession);
-    if (!_configuration) return log.fault("configuration must not be nil");
-    if (!_configuration->identifier || !_configuration->userAgent)
-        return log.fault("configuration requires identifier and agent");
-    if (_state) {
-        if (_state->identifier() != *_configuration->identifier) log.fault("session identifier must match");
-        return;
+    std::shared_ptr<TAVSessionConfiguration> configuration;
+    std::shared_ptr<ClientState> state;
+    {
+        platform::MutexLock lock(_mutex);
+        configuration = _configuration;
+        state = _state;
     }
-    if (auto state = _clientStateManager->stateForClientIdentifier(_configuration->identifier)) {
-        state->setConfiguration(_configuration);
-        std::lock_guard lock(_mutex);
-        _state = std::move(state);
+    if (!configuration) {
+        log.fault("configuration must not be nil");
+    } else if (!configuration->identifier || !configuration->userAgent) {
+        log.fault("configuration requires identifier and agent");
+    } else if (state) {
+        if (state->identifier() != *configuration->identifier) log.fault("session identifier must match");
+    } else if ((state = _clientStateManager->stateForClientIdentifier(configuration->identifier))) {
+        state->setConfiguration(configuration);
+        platform::MutexLock lock(_mutex);
+        _state = state;
     }
+    return state;
 }
 
 void ClientConnection::configure(std::shared_ptr<TAVSessionConfiguration> configuration,
@@ -93,11 +100,11 @@ void ClientConnection::configure(std::shared_ptr<TAVSessionConfiguration> config
     log(kLogConnection)
         .log("client configuration {}", configuration ? platform::toJson(platform::toValue(*configuration)) : "none");
     {
-        std::lock_guard lock(_mutex);
+        platform::MutexLock lock(_mutex);
         _configuration = std::move(configuration);
     }
-    _ensureState();
-    if (!_state) {
+    const auto state = _ensureState();
+    if (!state) {
         ClientSessionManager::reportErrorAsTavrindFeedback(
             makeTAVError(TAVErrorInvalidResponse, "invalid configuration"), _assembly);
         log(kLogSession).fault("invalid configuration, closing connection");
@@ -106,7 +113,7 @@ void ClientConnection::configure(std::shared_ptr<TAVSessionConfiguration> config
     }
 
     const std::string userAgent = this->userAgent();
-    _state->bag(
+    state->bag(
         userAgent,
         BagReply([weak = weak_from_this(), userAgent](std::shared_ptr<const TAVBag> bag, const OptionalError& error) {
             auto self = weak.lock();
@@ -142,9 +149,9 @@ void ClientConnection::bagChangeNotification(std::shared_ptr<const TAVBag> bag)
 
 void ClientConnection::bag(BagReply reply)
 {
-    _ensureState();
-    if (!_state) return reply(nullptr, makeTAVError(TAVErrorInvalidResponse, "client state nil"));
-    _state->bag(userAgent(), std::move(reply));
+    const auto state = _ensureState();
+    if (!state) return reply(nullptr, makeTAVError(TAVErrorInvalidResponse, "client state nil"));
+    state->bag(userAgent(), std::move(reply));
 }
 
 void ClientConnection::_completeDefaults(TAVRequest& request) const
@@ -164,27 +171,28 @@ void ClientConnection::_completeDefaults(TAVRequest& request) const
 
 void ClientConnection::request(std::shared_ptr<TAVRequest> request, RequestReply reply)
 {
-    _ensureState();
+    const auto state = _ensureState();
     const RequestKind* kind = kindOf(*request);
     if (!kind) return reply.abandon();
-    if (!_state) return reply(request->queryId, nullptr, makeTAVError(TAVErrorInvalidResponse, "client state nil"));
+    if (!state) return reply(request->queryId, nullptr, makeTAVError(TAVErrorInvalidResponse, "client state nil"));
     _completeDefaults(*request);
 
     const auto queryId = static_cast<std::uint64_t>(request->queryId);
     TAVTrace(kind->traceStart, queryId);
     if (kind->traceAnswer != kTraceNone)
         reply = std::move(reply).andThen([kind, queryId] { TAVTrace(kind->traceAnswer, queryId); });
-    if (kind->isSearch) return search(*kind, std::move(request), std::move(reply));
-    _state->perform(*kind, std::move(request), std::move(reply));
+    if (kind->isSearch) return search(*state, *kind, std::move(request), std::move(reply));
+    state->perform(*kind, std::move(request), std::move(reply));
 }
 
 /// Only the newest query counts. A query whose id is not above the highest accepted one gets an empty reply at once. If
 /// a newer query is accepted before an answer arrives, that answer is delivered empty.
-void ClientConnection::search(const RequestKind& kind, std::shared_ptr<TAVRequest> request, RequestReply reply)
+void ClientConnection::search(ClientState& state, const RequestKind& kind, std::shared_ptr<TAVRequest> request,
+                              RequestReply reply)
 {
     const std::int64_t queryId = request->queryId;
     const bool accepted = [&] {
-        std::lock_guard order(_orderMutex);
+        platform::MutexLock order(_orderMutex);
         std::int64_t current = _currentQueryId;
         return queryId > current && _currentQueryId.compare_exchange_strong(current, queryId);
     }();
@@ -194,11 +202,11 @@ void ClientConnection::search(const RequestKind& kind, std::shared_ptr<TAVReques
                              std::int64_t, std::shared_ptr<TAVReply> record, OptionalError error) mutable {
         const auto self = weak.lock();
         if (!self) return reply.abandon();
-        std::lock_guard order(self->_orderMutex);
+        platform::MutexLock order(self->_orderMutex);
         if (self->_currentQueryId > queryId) return reply(queryId, nullptr, {});
         reply(queryId, std::move(record), std::move(error));
     });
-    _state->perform(kind, std::move(request), std::move(ordered));
+    state.perform(kind, std::move(request), std::move(ordered));
 }
 
 void ClientConnection::_reportOneOff(const platform::Error& error) const
@@ -216,7 +224,8 @@ void ClientConnection::reportEvent(const std::string&, std::int64_t queryId, std
 void ClientConnection::reportEvent(std::shared_ptr<ZRFeedback> feedback, std::int64_t queryId,
                                    std::shared_ptr<void> call)
 {
-    if (!_state) {
+    const auto state = _boundState();
+    if (!state) {
         if (!_reportedNoState.exchange(true)) _reportOneOff(makeTAVError(TAVErrorInvalidResponse, "client state nil"));
         return log(kLogFeedback).error("state must not be nil");
     }
@@ -227,16 +236,16 @@ void ClientConnection::reportEvent(std::shared_ptr<ZRFeedback> feedback, std::in
     if (const auto* appear = dynamic_cast<const ZRSearchViewAppearFeedback*>(feedback.get())) {
         if (!appear->isOnLockScreen &&
             std::ranges::find(kWarmingEvents, appear->viewAppearEvent) != kWarmingEvents.end())
-            _state->warm();
+            state->warm();
     }
-    const auto manager = _state->sessionManager();
+    const auto manager = state->sessionManager();
     if (!manager) {
         _reportOneOff(makeTAVError(TAVErrorInvalidResponse, "session manager nil"));
         return log(kLogFeedback).error("session manager nil");
     }
     const std::uint64_t clientQueryId = feedbackClassOf(*feedback).clientQueryId(*feedback);
 
-    const auto& shortName = _state->clientShortName();
+    const auto& shortName = state->clientShortName();
     const auto* engagement = dynamic_cast<const ZRResultEngagementFeedback*>(feedback.get());
     if (engagement && engagement->result && shortName) {
         if (engagement->result->topHit != TopHit::No)
@@ -270,11 +279,11 @@ void ClientConnection::handleCustomFeedback(std::shared_ptr<ZRCustomFeedback> fe
 void ClientConnection::feedback(const std::string&, platform::Reply<platform::Value::Array, OptionalError> reply)
 {
     TAVTrace(kTraceFeedbackStart, 0);
-    _ensureState();
-    if (!_state) {
+    const auto state = _ensureState();
+    if (!state) {
         reply({}, makeTAVError(TAVErrorInvalidResponse, "client state nil"));
     } else {
-        const auto manager = _state->sessionManager();
+        const auto manager = state->sessionManager();
         const auto session = manager ? manager->session() : nullptr;
         reply(session ? session->feedbacksWithRelativeTimestamp() : platform::Value::Array(), {});
     }

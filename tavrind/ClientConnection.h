@@ -8,6 +8,7 @@
 #include <string>
 
 #include "CoreTavrin/TAVProtocols.h"
+#include "platform/base/Mutex.h"
 #include "platform/run/NotificationCenter.h"
 
 namespace tavrin {
@@ -55,10 +56,11 @@ public:
     [[nodiscard]] std::string userAgent() const;
 
 private:
-    void _ensureState();
+    /// Binds the connection to the state of its client if it has none yet, and returns it; null if it can't.
+    std::shared_ptr<ClientState> _ensureState();
     [[nodiscard]] std::shared_ptr<ClientState> _boundState() const;
     void _completeDefaults(TAVRequest& request) const;
-    void search(const RequestKind& kind, std::shared_ptr<TAVRequest> request, RequestReply reply);
+    void search(ClientState& state, const RequestKind& kind, std::shared_ptr<TAVRequest> request, RequestReply reply);
     void reportEvent(std::shared_ptr<ZRFeedback> feedback, std::int64_t queryId, std::shared_ptr<void> call);
     void handleCustomFeedback(std::shared_ptr<ZRCustomFeedback> feedback, std::int64_t queryId,
                               std::move_only_function<void()> callback);
@@ -70,13 +72,14 @@ private:
     std::shared_ptr<TAVClientXPC> _remoteObject;
     std::shared_ptr<platform::ipc::Connection> _connection;
     std::shared_ptr<TavrinFlusherXPC> _flusherListener;
-    mutable std::mutex _mutex; // guards the two below: written on the connection's queue, read on any thread
-    std::shared_ptr<TAVSessionConfiguration> _configuration;
-    std::shared_ptr<ClientState> _state;
+    mutable platform::Mutex _mutex;
+    // Written on the connection's queue, read on any thread.
+    std::shared_ptr<TAVSessionConfiguration> _configuration GUARDED_BY(_mutex);
+    std::shared_ptr<ClientState> _state GUARDED_BY(_mutex);
     std::atomic<std::int64_t> _currentQueryId = 0; // the highest accepted; only compare-and-swap raises it
     // Held while a query is accepted, and while an answer is checked and sent. Otherwise a newer query could be
     // accepted and answered between the check of an older answer and its delivery.
-    std::mutex _orderMutex;
+    platform::Mutex _orderMutex;
     std::atomic<bool> _reportedNoState = false; ///< limits the error sessions to one for each connection
     platform::NotificationCenter::Token _bagObserver;
 };

@@ -169,13 +169,13 @@ void DownloadManager::_publish()
         if (std::string version = _resourceVersion(resource); !version.empty())
             versions.set(identifier, std::move(version));
     auto published = std::make_shared<const Published>(_resources, std::move(versions));
-    const std::lock_guard lock(_publishedMutex);
+    const platform::MutexLock lock(_publishedMutex);
     _published.swap(published);
 }
 
 std::shared_ptr<const DownloadManager::Published> DownloadManager::_lastPublished() const
 {
-    const std::lock_guard lock(_publishedMutex);
+    const platform::MutexLock lock(_publishedMutex);
     return _published;
 }
 

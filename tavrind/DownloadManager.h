@@ -8,6 +8,7 @@
 #include <optional>
 #include <string>
 
+#include "platform/base/Mutex.h"
 #include "platform/files/Files.h"
 #include "platform/net/BackgroundSession.h"
 #include "platform/run/NotificationCenter.h"
@@ -125,9 +126,9 @@ private:
     std::map<std::string, Pending> _pending; // by identifier
     std::uint64_t _lastTimer = 0;
     std::weak_ptr<LookupResources> _lookupResources;
-    mutable std::mutex _publishedMutex;
-    std::shared_ptr<const Published> _published; // under the mutex, any thread
-    std::once_flag _started;                     // any thread
+    mutable platform::Mutex _publishedMutex;
+    std::shared_ptr<const Published> _published GUARDED_BY(_publishedMutex); // any thread
+    std::once_flag _started;                                                 // any thread
     platform::NotificationCenter::Token _bagObserver;
     platform::NotificationCenter::Token _locationObserver;
 };

@@ -76,21 +76,21 @@ void FeedbackBooks::_load()
 
 void FeedbackBooks::record(FeedbackFate fate, std::uint64_t events)
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     _recorded += static_cast<std::int64_t>(events);
     _counts[at(fate)] += static_cast<std::int64_t>(events);
 }
 
 void FeedbackBooks::move(FeedbackFate from, FeedbackFate to, std::uint64_t events)
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     _counts[at(from)] -= static_cast<std::int64_t>(events);
     _counts[at(to)] += static_cast<std::int64_t>(events);
 }
 
 void FeedbackBooks::find(FeedbackFate fate, std::uint64_t events)
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     const auto found = static_cast<std::int64_t>(events);
     const std::int64_t known = std::min(found, _unresolved);
     _unresolved -= known;
@@ -102,7 +102,7 @@ void FeedbackBooks::find(FeedbackFate fate, std::uint64_t events)
 void FeedbackBooks::settle(const std::string& upload, FeedbackFate outcome, std::uint64_t events)
 {
     {
-        const std::lock_guard lock(_mutex);
+        const platform::MutexLock lock(_mutex);
         _settled.push_back(upload);
         if (_settled.size() > kMaximumSettled) _settled.pop_front();
         _counts[at(FeedbackFate::Uploading)] -= static_cast<std::int64_t>(events);
@@ -113,16 +113,16 @@ void FeedbackBooks::settle(const std::string& upload, FeedbackFate outcome, std:
 
 bool FeedbackBooks::isSettled(const std::string& upload) const
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     return std::ranges::find(_settled, upload) != _settled.end();
 }
 
 void FeedbackBooks::save()
 {
-    const std::lock_guard saving(_saving);
+    const platform::MutexLock saving(_saving);
     Value books = description();
     {
-        const std::lock_guard lock(_mutex);
+        const platform::MutexLock lock(_mutex);
         books.mutableDictionary().set("settled", Value::Array(_settled.begin(), _settled.end()));
     }
     const std::string text = platform::toJson(books);
@@ -134,12 +134,12 @@ void FeedbackBooks::save()
 void FeedbackBooks::saveSoon()
 {
     {
-        const std::lock_guard lock(_mutex);
+        const platform::MutexLock lock(_mutex);
         if (std::exchange(_saveQueued, true)) return;
     }
     _queue->async([this] {
         {
-            const std::lock_guard lock(_mutex);
+            const platform::MutexLock lock(_mutex);
             _saveQueued = false;
         }
         save();
@@ -148,19 +148,19 @@ void FeedbackBooks::saveSoon()
 
 std::int64_t FeedbackBooks::recorded() const
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     return _recorded;
 }
 
 std::int64_t FeedbackBooks::count(FeedbackFate fate) const
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     return _counts[at(fate)];
 }
 
 Value FeedbackBooks::description() const
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     Dictionary books{{"recorded", _recorded}};
     Dictionary dropped;
     for (std::size_t fate = 0; fate < kFeedbackFates; ++fate)

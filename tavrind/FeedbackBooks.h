@@ -8,6 +8,7 @@
 #include <mutex>
 #include <string>
 
+#include "platform/base/Mutex.h"
 #include "platform/values/Value.h"
 
 namespace platform {
@@ -82,19 +83,19 @@ public:
     [[nodiscard]] platform::Value description() const;
 
 private:
-    void _load();
+    void _load() REQUIRES(_mutex);
 
     platform::FileSystem& _files;
     const std::filesystem::path _path;
     const std::string _process;
-    mutable std::mutex _mutex; // guards all below
-    std::int64_t _recorded = 0;
-    std::array<std::int64_t, kFeedbackFates> _counts{};
-    std::int64_t _unresolved = 0;     ///< unknown events that may still be found
-    std::deque<std::string> _settled; ///< uploads whose outcome is booked, the newest last
-    bool _saveQueued = false;
+    mutable platform::Mutex _mutex;
+    std::int64_t _recorded GUARDED_BY(_mutex) = 0;
+    std::array<std::int64_t, kFeedbackFates> _counts GUARDED_BY(_mutex){};
+    std::int64_t _unresolved GUARDED_BY(_mutex) = 0;     ///< unknown events that may still be found
+    std::deque<std::string> _settled GUARDED_BY(_mutex); ///< uploads whose outcome is booked, the newest last
+    bool _saveQueued GUARDED_BY(_mutex) = false;
     std::shared_ptr<platform::Queue> _queue;
-    std::mutex _saving; // orders the writes: an older state never overwrites a newer one
+    platform::Mutex _saving; // orders the writes: an older state never overwrites a newer one
 };
 
 } // namespace tavrin

@@ -1,11 +1,12 @@
 #include "platform/base/Log.h"
 
 #include <algorithm>
-#include <mutex>
 
 #include <spdlog/sinks/stdout_sinks.h>
 #include <spdlog/sinks/systemd_sink.h>
 #include <spdlog/spdlog.h>
+
+#include "platform/base/Mutex.h"
 
 namespace platform {
 
@@ -39,8 +40,8 @@ std::shared_ptr<spdlog::logger>& sink()
     return logger;
 }
 
-std::mutex tapMutex;
-std::function<void(const LogLine&)> tap; // under tapMutex
+Mutex tapMutex;
+std::function<void(const LogLine&)> tap GUARDED_BY(tapMutex);
 std::atomic<bool> tapped = false;
 std::atomic<LogLevel> sinkThreshold = LogLevel::Debug; // raised while a tap has lowered `Log::threshold`
 
@@ -84,7 +85,7 @@ void Log::emit(LogLevel level, std::string text) const
 {
     text = withoutControlCharacters(std::move(text));
     if (tapped) {
-        std::lock_guard lock(tapMutex);
+        MutexLock lock(tapMutex);
         if (tap) tap({level, _subsystem, _category, text});
     }
     if (level < sinkThreshold) return;
@@ -102,7 +103,7 @@ void setLogSink(LogSink kind, std::string_view program)
 
 LogTap::LogTap(std::function<void(const LogLine&)> newTap) : _previousThreshold(Log::threshold)
 {
-    std::lock_guard lock(tapMutex);
+    MutexLock lock(tapMutex);
     tap = std::move(newTap);
     tapped = true;
     sinkThreshold = _previousThreshold;
@@ -111,7 +112,7 @@ LogTap::LogTap(std::function<void(const LogLine&)> newTap) : _previousThreshold(
 
 LogTap::~LogTap()
 {
-    std::lock_guard lock(tapMutex);
+    MutexLock lock(tapMutex);
     tap = nullptr;
     tapped = false;
     sinkThreshold = LogLevel::Debug;

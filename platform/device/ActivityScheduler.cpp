@@ -3,10 +3,10 @@
 #include <algorithm>
 #include <cerrno>
 #include <map>
-#include <mutex>
 #include <vector>
 
 #include "platform/base/Log.h"
+#include "platform/base/Mutex.h"
 #include "platform/device/ActivityPolicy.h"
 #include "platform/device/DeviceUse.h"
 #include "platform/files/Files.h"
@@ -55,7 +55,7 @@ public:
     [[nodiscard]] const std::string& identifier() const override { return _identifier; }
     [[nodiscard]] ActivityState state() const override
     {
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         return _state;
     }
     bool setState(ActivityState state) override
@@ -63,7 +63,7 @@ public:
         using enum ActivityState;
         Ended ended;
         {
-            std::lock_guard lock(_mutex);
+            MutexLock lock(_mutex);
             const bool ends = state == Defer || state == Done;
             if (!(_state == Run && (ends || state == Continue)) && !(_state == Continue && ends)) return false;
             _state = state;
@@ -80,22 +80,22 @@ public:
     }
     void setCriteria(ActivityCriteria criteria) override
     {
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         if (_state == ActivityState::CheckIn) _criteria = criteria;
     }
     [[nodiscard]] ActivityCriteria criteria() const override
     {
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         return _criteria;
     }
 
 private:
     const std::string _identifier;
     DeviceUseSource& _use;
-    mutable std::mutex _mutex;
-    ActivityCriteria _criteria; // under the mutex, like the rest
-    ActivityState _state;
-    Ended _ended;
+    mutable Mutex _mutex;
+    ActivityCriteria _criteria GUARDED_BY(_mutex);
+    ActivityState _state GUARDED_BY(_mutex);
+    Ended _ended GUARDED_BY(_mutex);
 };
 
 /// All non-const members are confined to `_queue`.

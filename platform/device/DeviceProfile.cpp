@@ -5,6 +5,7 @@
 #include <vector>
 
 #include "platform/base/Log.h"
+#include "platform/base/Mutex.h"
 #include "platform/files/Files.h"
 #include "platform/files/FileWatch.h"
 #include "platform/run/RunLoop.h"
@@ -35,7 +36,7 @@ public:
 
     DeviceProfile profile() override
     {
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         if (!_profile) {
             _profile = read();
             // The watch lives on the run loop's thread. `changed` reports a change that preceded it.
@@ -49,7 +50,7 @@ public:
 
     void onChange(std::function<void(const DeviceProfile&)> handler) override
     {
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         _handlers.push_back(std::move(handler));
     }
 
@@ -72,7 +73,7 @@ private:
         std::vector<std::function<void(const DeviceProfile&)>> handlers;
         DeviceProfile fresh = read();
         {
-            std::lock_guard lock(_mutex);
+            MutexLock lock(_mutex);
             if (fresh == _profile) return;
             _profile = fresh;
             handlers = _handlers;
@@ -83,10 +84,10 @@ private:
     FileSystem& _files;
     const std::filesystem::path _path;
     RunLoop& _runLoop;
-    std::mutex _mutex;
-    std::optional<DeviceProfile> _profile;                            // under the mutex
-    std::vector<std::function<void(const DeviceProfile&)>> _handlers; // under the mutex
-    std::optional<FileWatch> _watch;                                  // loop's thread
+    Mutex _mutex;
+    std::optional<DeviceProfile> _profile GUARDED_BY(_mutex);
+    std::vector<std::function<void(const DeviceProfile&)>> _handlers GUARDED_BY(_mutex);
+    std::optional<FileWatch> _watch; // loop's thread
 };
 
 } // namespace

@@ -1,10 +1,10 @@
 #include "platform/device/DeviceUseLogind.h"
 
-#include <mutex>
 #include <string>
 #include <utility>
 #include <vector>
 
+#include "platform/base/Mutex.h"
 #include "platform/device/DeviceUse.h"
 #include "platform/files/Files.h"
 #include "platform/ipc/SystemBus.h"
@@ -34,7 +34,7 @@ public:
     void ask(Answer answer) override
     {
         {
-            std::lock_guard lock(_mutex);
+            MutexLock lock(_mutex);
             _waiting.push_back(std::move(answer));
             if (_waiting.size() > 1) return; // a request is pending
         }
@@ -46,7 +46,7 @@ public:
     }
     DeviceUse last() override
     {
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         return _last;
     }
 
@@ -71,7 +71,7 @@ private:
         const DeviceUse use{.onBattery = isOnBattery(_supplies), .screenInUse = screenInUse, .unlocked = unlocked};
         std::vector<Answer> waiting;
         {
-            std::lock_guard lock(_mutex);
+            MutexLock lock(_mutex);
             _last = use;
             waiting.swap(_waiting);
         }
@@ -82,9 +82,9 @@ private:
     const std::filesystem::path _supplies;
     ipc::SystemBus _bus; // run loop's thread, like the next
     bool _hadSession = false;
-    std::mutex _mutex;
-    DeviceUse _last; // under the mutex, like the next
-    std::vector<Answer> _waiting;
+    Mutex _mutex;
+    DeviceUse _last GUARDED_BY(_mutex);
+    std::vector<Answer> _waiting GUARDED_BY(_mutex);
 };
 
 } // namespace

@@ -13,6 +13,7 @@
 
 #include "platform/base/Date.h"
 #include "platform/base/Log.h"
+#include "platform/base/Mutex.h"
 #include "platform/files/Files.h"
 #include "platform/files/FileWatch.h"
 #include "platform/run/Clock.h"
@@ -191,7 +192,7 @@ public:
 
     void onChange(std::function<void()> handler) override
     {
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         _handler = std::move(handler);
         if (std::exchange(_watching, true)) return;
         _runLoop.execute(Priority::Default, [this] {
@@ -241,7 +242,7 @@ private:
         if (!tell) return;
         std::function<void()> handler;
         {
-            std::lock_guard lock(_mutex);
+            MutexLock lock(_mutex);
             handler = _handler;
         }
         if (handler) handler();
@@ -287,9 +288,9 @@ private:
     RunLoop& _runLoop;
     Executor& _executor;
     Clock& _clock;
-    std::mutex _mutex;
-    std::function<void()> _handler; // under the mutex, like the next
-    bool _watching = false;
+    Mutex _mutex;
+    std::function<void()> _handler GUARDED_BY(_mutex);
+    bool _watching GUARDED_BY(_mutex) = false;
 
     // Run loop's thread
     std::map<fs::path, std::unique_ptr<FileWatch>> _watches;

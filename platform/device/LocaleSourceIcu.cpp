@@ -4,7 +4,6 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
-#include <mutex>
 #include <optional>
 
 #include <unicode/calendar.h>
@@ -13,6 +12,7 @@
 #include <unicode/timezone.h>
 #include <unicode/ulocdata.h>
 
+#include "platform/base/Mutex.h"
 #include "platform/device/LocaleSource.h"
 #include "platform/files/FileWatch.h"
 #include "platform/run/RunLoop.h"
@@ -116,7 +116,7 @@ public:
 
     LocaleContext locale() override
     {
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         if (!_locale) {
             _locale = read();
             startWatching();
@@ -152,14 +152,14 @@ public:
 
     void onChange(std::function<void(Change)> handler) override
     {
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         _handler = std::move(handler);
     }
 
 private:
     /// Reads the system's files only after they have changed: before that the environment counts, which the login set
     /// from them.
-    LocaleContext read()
+    LocaleContext read() REQUIRES(_mutex)
     {
         std::optional<std::string> name;
         std::optional<std::string> languages = environment("LANGUAGE");
@@ -190,7 +190,7 @@ private:
     void localeChanged()
     {
         {
-            std::lock_guard lock(_mutex);
+            MutexLock lock(_mutex);
             _filesChanged = true;
             LocaleContext fresh = read();
             if (fresh == _locale) return;
@@ -203,7 +203,7 @@ private:
     {
         std::function<void(Change)> handler;
         {
-            std::lock_guard lock(_mutex);
+            MutexLock lock(_mutex);
             handler = _handler;
         }
         if (handler) handler(change);
@@ -211,10 +211,10 @@ private:
 
     RunLoop& _runLoop;
     const fs::path _etc;
-    std::mutex _mutex;
-    std::optional<LocaleContext> _locale; // under the mutex, like the next two
-    bool _filesChanged = false;
-    std::function<void(Change)> _handler;
+    Mutex _mutex;
+    std::optional<LocaleContext> _locale GUARDED_BY(_mutex);
+    bool _filesChanged GUARDED_BY(_mutex) = false;
+    std::function<void(Change)> _handler GUARDED_BY(_mutex);
     std::vector<std::unique_ptr<FileWatch>> _watches; // loop's thread
 };
 

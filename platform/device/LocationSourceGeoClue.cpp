@@ -1,8 +1,7 @@
 #include "platform/device/LocationSourceGeoClue.h"
 
-#include <mutex>
-
 #include "platform/base/Log.h"
+#include "platform/base/Mutex.h"
 #include "platform/device/LocationSource.h"
 #include "platform/ipc/SystemBus.h"
 #include "platform/run/RunLoop.h"
@@ -38,20 +37,20 @@ public:
     }
     std::optional<Location> current() override
     {
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         return _current;
     }
     void requestUpdate() override
     {
         // A running client reports every move, so only a failed start is repeated.
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         if (!_wantsRestart) return;
         _wantsRestart = false;
         _runLoop.execute(Priority::Default, [this] { start(); });
     }
     void onChange(Handler handler) override
     {
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         _handler = std::move(handler);
     }
 
@@ -138,7 +137,7 @@ private:
     void lose(const std::string& reason, bool mayRestart)
     {
         {
-            std::lock_guard lock(_mutex);
+            MutexLock lock(_mutex);
             _wantsRestart = mayRestart && _restarts++ < kMaximumRestarts;
         }
         defaultLog().info("no location: {}", reason);
@@ -149,7 +148,7 @@ private:
     {
         Handler handler;
         {
-            std::lock_guard lock(_mutex);
+            MutexLock lock(_mutex);
             if (location == _current) return;
             _current = location;
             handler = _handler;
@@ -167,11 +166,11 @@ private:
     bool _isAsking = false; // GetClient is pending
     std::set<std::string> _allowed;
     std::optional<ipc::SystemBus::Object> _client;
-    std::mutex _mutex;
-    std::optional<Location> _current; // under the mutex, like the next three
-    bool _wantsRestart = false;
-    int _restarts = 0;
-    Handler _handler;
+    Mutex _mutex;
+    std::optional<Location> _current GUARDED_BY(_mutex);
+    bool _wantsRestart GUARDED_BY(_mutex) = false;
+    int _restarts GUARDED_BY(_mutex) = 0;
+    Handler _handler GUARDED_BY(_mutex);
 };
 
 } // namespace

@@ -6,6 +6,7 @@
 #include <optional>
 
 #include "platform/base/Log.h"
+#include "platform/base/Mutex.h"
 #include "platform/files/Files.h"
 #include "platform/files/FileWatch.h"
 #include "platform/run/Clock.h"
@@ -54,7 +55,7 @@ public:
 
     void onChange(std::function<void()> handler) override
     {
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         const bool watched = static_cast<bool>(_handler);
         _handler = std::move(handler);
         if (watched) return;
@@ -86,7 +87,7 @@ private:
     {
         std::function<void()> handler;
         {
-            std::lock_guard lock(_mutex);
+            MutexLock lock(_mutex);
             handler = _handler;
         }
         if (handler) handler();
@@ -96,8 +97,8 @@ private:
     const std::filesystem::path _directory;
     RunLoop& _runLoop;
     Clock& _clock;
-    std::mutex _mutex;
-    std::function<void()> _handler;  // under the mutex
+    Mutex _mutex;
+    std::function<void()> _handler GUARDED_BY(_mutex);
     std::optional<FileWatch> _watch; // loop's thread
 };
 

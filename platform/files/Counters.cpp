@@ -4,13 +4,13 @@
 #include <atomic>
 #include <cerrno>
 #include <mutex>
-#include <shared_mutex>
 #include <unordered_map>
 #include <vector>
 
 #include <fmt/format.h>
 
 #include "platform/base/Log.h"
+#include "platform/base/Mutex.h"
 #include "platform/files/Files.h"
 #include "platform/run/Queue.h"
 #include "platform/values/Dictionary.h"
@@ -50,26 +50,18 @@ struct CounterStore::Impl : std::enable_shared_from_this<Impl> {
         std::atomic<std::uint64_t> uses; ///< starts at the value that the file has
     };
 
-    mutable std::shared_mutex mutex;
-    std::unordered_map<std::string, Counter, KeyHash, std::equal_to<>> counters; // under the mutex
+    mutable SharedMutex mutex;
+    std::unordered_map<std::string, Counter, KeyHash, std::equal_to<>> counters GUARDED_BY(mutex);
     std::atomic<bool> writeQueued = false;
-    mutable std::mutex writing; // orders writers: an older snapshot must not overwrite a newer one
+    mutable Mutex writing; // orders writers: an older snapshot must not overwrite a newer one
 
     /// Calls `change` with the counter's value; creates the counter if it is missing.
     template <class Change> void with(std::string_view key, Change change)
     {
+        if (withExisting(key, change)) return changed();
+        if (key.size() > kMaximumKeyLength) return;
         {
-            std::shared_lock lock(mutex);
-            if (const auto found = counters.find(key); found != counters.end()) {
-                change(found->second.value);
-                found->second.uses.fetch_add(1, std::memory_order_relaxed);
-                lock.unlock();
-                return changed();
-            }
-        }
-        {
-            std::unique_lock lock(mutex);
-            if (key.size() > kMaximumKeyLength) return;
+            MutexLock lock(mutex);
             if (counters.size() >= kMaximumCounters && !counters.contains(key)) evict();
             Counter& counter = counters.try_emplace(std::string(key), 0).first->second;
             change(counter.value);
@@ -78,8 +70,19 @@ struct CounterStore::Impl : std::enable_shared_from_this<Impl> {
         changed();
     }
 
-    /// Removes the least used counters. The caller holds the mutex exclusively.
-    void evict()
+    /// Returns false if there is no such counter.
+    template <class Change> [[nodiscard]] bool withExisting(std::string_view key, Change& change)
+    {
+        SharedMutexLock lock(mutex);
+        const auto found = counters.find(key);
+        if (found == counters.end()) return false;
+        change(found->second.value);
+        found->second.uses.fetch_add(1, std::memory_order_relaxed);
+        return true;
+    }
+
+    /// Removes the least used counters.
+    void evict() REQUIRES(mutex)
     {
         std::vector<std::pair<std::uint64_t, std::string_view>> byUse;
         for (const auto& [key, counter] : counters) byUse.emplace_back(counter.uses.load(), key);
@@ -100,14 +103,14 @@ struct CounterStore::Impl : std::enable_shared_from_this<Impl> {
     std::map<std::string, std::int64_t> snapshot() const
     {
         std::map<std::string, std::int64_t> all;
-        std::shared_lock lock(mutex);
+        SharedMutexLock lock(mutex);
         for (const auto& [key, counter] : counters) all.emplace(key, counter.value.load());
         return all;
     }
 
     void write() const
     {
-        const std::lock_guard writer(writing);
+        const MutexLock writer(writing);
         Dictionary contents;
         for (const auto& [key, count] : snapshot()) contents.set(key, count);
         auto made = files->createDirectories(path.parent_path());
@@ -126,7 +129,7 @@ struct CounterStore::Impl : std::enable_shared_from_this<Impl> {
         const auto contents = parseJson(bytes->view(), kMaximumCountersSize);
         if (!contents || !contents->asDictionary())
             return defaultLog().error("counters {} are broken, starting at 0", path.string());
-        std::unique_lock lock(mutex);
+        MutexLock lock(mutex);
         for (const auto& [key, count] : *contents->asDictionary())
             if (const auto number = count.asInt(); number && counters.size() < kMaximumCounters)
                 counters.try_emplace(key, *number);
@@ -159,7 +162,7 @@ void CounterStore::set(std::string_view key, std::int64_t value)
 void CounterStore::clear(std::string_view key)
 {
     {
-        std::unique_lock lock(_impl->mutex);
+        MutexLock lock(_impl->mutex);
         const auto found = _impl->counters.find(key);
         if (found == _impl->counters.end()) return;
         _impl->counters.erase(found);
@@ -174,7 +177,7 @@ void CounterStore::synchronize()
 
 std::int64_t CounterStore::value(std::string_view key) const
 {
-    std::shared_lock lock(_impl->mutex);
+    SharedMutexLock lock(_impl->mutex);
     const auto found = _impl->counters.find(key);
     return found == _impl->counters.end() ? 0 : found->second.value.load();
 }

@@ -7,6 +7,7 @@
 #include <set>
 
 #include "platform/base/Log.h"
+#include "platform/base/Mutex.h"
 #include "platform/files/Files.h"
 #include "platform/files/FileWatch.h"
 #include "platform/run/Queue.h"
@@ -29,13 +30,13 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
     fs::path path;
     std::shared_ptr<Queue> writeQueue;
 
-    mutable std::mutex mutex; // guards all below
-    Dictionary values;
-    Dictionary registered;
-    std::set<std::string, std::less<>> dirty; // keys that were set and are not yet in the file
-    bool writeQueued = false;
-    bool fileIsBroken = false;
-    std::mutex writing; // one reader or writer of the file at a time; taken before `mutex`
+    mutable Mutex mutex;
+    Dictionary values GUARDED_BY(mutex);
+    Dictionary registered GUARDED_BY(mutex);
+    std::set<std::string, std::less<>> dirty GUARDED_BY(mutex); // keys that were set and are not yet in the file
+    bool writeQueued GUARDED_BY(mutex) = false;
+    bool fileIsBroken GUARDED_BY(mutex) = false;
+    Mutex writing; // one reader or writer of the file at a time; taken before `mutex`
     std::unique_ptr<FileWatch> watch;
     int lockAttempts = 0;  // failed ones since the last write; write queue only, like the next
     bool retrying = false; // a timer runs
@@ -55,9 +56,9 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
 
     void load()
     {
-        std::lock_guard reader(writing); // a writer must not finish between the read and the assignment below
+        MutexLock reader(writing); // a writer must not finish between the read and the assignment below
         auto contents = readFile();
-        std::lock_guard lock(mutex);
+        MutexLock lock(mutex);
         fileIsBroken = !contents;
         if (!contents) {
             defaultLog().error("user defaults {} can't be read, defaults apply: {}", path.string(),
@@ -93,9 +94,9 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
     /// fails with EWOULDBLOCK.
     Result<void> write(Lock need)
     {
-        std::lock_guard writer(writing);
+        MutexLock writer(writing);
         {
-            std::lock_guard lock(mutex);
+            MutexLock lock(mutex);
             writeQueued = false;
             if (dirty.empty()) return {};
         }
@@ -113,7 +114,7 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
         Dictionary merged = contents ? std::move(*contents) : Dictionary();
         std::set<std::string, std::less<>> written;
         {
-            std::lock_guard lock(mutex);
+            MutexLock lock(mutex);
             written.swap(dirty);
             for (const std::string& key : written) {
                 if (const Value* mine = values.find(key))
@@ -128,7 +129,7 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
         const auto done = text.size() <= kMaximumSuiteSize ? files->writeAtomically(path, text)
                                                            : Result<void>(std::unexpected(Error::posix(EFBIG)));
         if (done) return {};
-        std::lock_guard lock(mutex);
+        MutexLock lock(mutex);
         dirty.merge(written);
         return writeFailed(done.error());
     }
@@ -166,13 +167,13 @@ UserDefaults::~UserDefaults()
 
 void UserDefaults::registerDefaults(const Dictionary& defaults)
 {
-    std::lock_guard lock(_impl->mutex);
+    MutexLock lock(_impl->mutex);
     for (const auto& [key, value] : defaults) _impl->registered.set(key, value);
 }
 
 Value UserDefaults::value(std::string_view key) const
 {
-    std::lock_guard lock(_impl->mutex);
+    MutexLock lock(_impl->mutex);
     if (const Value* found = _impl->values.find(key)) return *found;
     const Value* found = _impl->registered.find(key);
     return found ? *found : Value();
@@ -217,7 +218,7 @@ std::optional<Date> UserDefaults::date(std::string_view key) const
 
 void UserDefaults::set(std::string_view key, Value value)
 {
-    std::lock_guard lock(_impl->mutex);
+    MutexLock lock(_impl->mutex);
     if (const auto date = value.asDate()) value = secondsSince1970(*date);
     if (value.isNull())
         _impl->values.remove(key);
@@ -243,7 +244,7 @@ void UserDefaults::reload()
 
 Dictionary UserDefaults::contents() const
 {
-    std::lock_guard lock(_impl->mutex);
+    MutexLock lock(_impl->mutex);
     return _impl->values;
 }
 

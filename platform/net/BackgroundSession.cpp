@@ -3,13 +3,13 @@
 #include <algorithm>
 #include <atomic>
 #include <map>
-#include <mutex>
 #include <random>
 #include <set>
 
 #include <fmt/format.h>
 
 #include "platform/base/Log.h"
+#include "platform/base/Mutex.h"
 #include "platform/net/BackgroundAgenda.h"
 #include "platform/net/BackgroundPolicy.h"
 #include "platform/net/BackgroundStore.h"
@@ -71,17 +71,17 @@ public:
     [[nodiscard]] bool isUpload() const override { return _isUpload; }
     [[nodiscard]] Value note() const override
     {
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         return _note;
     }
     [[nodiscard]] Value timingData() const override
     {
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         return _timing;
     }
     void setTiming(Value timing)
     {
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         _timing = std::move(timing);
     }
 
@@ -90,9 +90,9 @@ private:
     const std::uint64_t _identifier;
     const bool _isUpload;
     const std::shared_ptr<const UrlRequest> _request;
-    mutable std::mutex _mutex;
-    Value _note;   // under the mutex
-    Value _timing; // under the mutex
+    mutable Mutex _mutex;
+    Value _note GUARDED_BY(_mutex);
+    Value _timing GUARDED_BY(_mutex);
 };
 
 /// Reports an upload's progress to the delegate. Merges reports that arrive faster than the delegate's queue runs.
@@ -299,7 +299,7 @@ void Task::setNote(Value note)
     if (const std::size_t size = jsonSize(note); size > kMaximumNote)
         return defaultLog().error("a note of {} bytes is too large for background task {}", size, _identifier);
     {
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         _note = note;
     }
     if (const auto session = _session.lock()) session->setNote(_identifier, note);

@@ -1,7 +1,6 @@
 #include "platform/net/HttpCache.h"
 
 #include <list>
-#include <mutex>
 #include <string>
 #include <string_view>
 #include <unordered_map>
@@ -9,6 +8,7 @@
 #include <vector>
 
 #include "platform/base/Log.h"
+#include "platform/base/Mutex.h"
 #include "platform/net/HttpCacheStore.h"
 #include "platform/run/Clock.h"
 #include "platform/run/Queue.h"
@@ -120,7 +120,7 @@ struct HttpCache::Impl : std::enable_shared_from_this<Impl> {
     {
         const Stored shared = std::make_shared<const StoredResponse>(std::move(stored));
 
-        std::lock_guard lock(mutex);
+        MutexLock lock(mutex);
         memory.put(key, shared);
         if (!hasDisk()) return;
         const std::size_t size = sizeOf(key, *shared);
@@ -131,7 +131,7 @@ struct HttpCache::Impl : std::enable_shared_from_this<Impl> {
 
     void remove(std::string key)
     {
-        std::lock_guard lock(mutex);
+        MutexLock lock(mutex);
         memory.remove(key);
         if (hasDisk()) removeLater(std::move(key));
     }
@@ -142,32 +142,30 @@ private:
     [[nodiscard]] bool hasDisk() const { return configuration.files && !configuration.directory.empty(); }
     [[nodiscard]] static std::size_t hash(const std::string& key) { return std::hash<std::string>()(key); }
 
-    // The caller holds the mutex.
-
     /// Returns true if the key may be on disk, now or after pending changes.
-    [[nodiscard]] bool mayBeOnDisk(const std::string& key) const
+    [[nodiscard]] bool mayBeOnDisk(const std::string& key) const REQUIRES(mutex)
     {
         return !onDisk || onDisk->contains(hash(key)) || changing.contains(hash(key));
     }
     /// Queues a change of the disk. `keyHash` is the hash of its key; the change holds `bytes` until it is done.
-    void change(std::size_t keyHash, std::size_t bytes, Queue::Task work)
+    void change(std::size_t keyHash, std::size_t bytes, Queue::Task work) REQUIRES(mutex)
     {
         changing.insert(keyHash);
         waitingBytes += bytes;
         configuration.queue->async([self = shared_from_this(), keyHash, bytes, work = std::move(work)]() mutable {
             work();
-            std::lock_guard lock(self->mutex);
+            MutexLock lock(self->mutex);
             self->changing.erase(self->changing.find(keyHash));
             self->waitingBytes -= bytes;
         });
     }
-    void removeLater(std::string key)
+    void removeLater(std::string key) REQUIRES(mutex)
     {
         if (!mayBeOnDisk(key)) return;
         const std::size_t keyHash = hash(key);
         change(keyHash, 0, [self = shared_from_this(), key = std::move(key)] { self->removeFromDisk(key); });
     }
-    void forgetOnDisk(const std::string& key)
+    void forgetOnDisk(const std::string& key) REQUIRES(mutex)
     {
         if (onDisk) onDisk->erase(hash(key));
     }
@@ -177,7 +175,7 @@ private:
     /// Returns true if the disk need not be read; `stored` is then the result.
     [[nodiscard]] bool decidedWithoutDisk(const std::string& key, Stored& stored)
     {
-        std::lock_guard lock(mutex);
+        MutexLock lock(mutex);
         stored = memory.find(key);
         return stored || !hasDisk() || !mayBeOnDisk(key);
     }
@@ -192,7 +190,7 @@ private:
             failed(found.error());
             return nullptr;
         }
-        std::lock_guard lock(mutex);
+        MutexLock lock(mutex);
         if (!*found)
             forgetOnDisk(key);
         else if (!(*found)->mapped && !changing.contains(hash(key)))
@@ -215,7 +213,7 @@ private:
             }
             if (evicted) {
                 failing = false;
-                std::lock_guard lock(mutex);
+                MutexLock lock(mutex);
                 onDisk->insert(hash(key));
                 for (const std::string& other : *evicted) forgetOnDisk(other);
                 return;
@@ -226,7 +224,7 @@ private:
                 failed(evicted.error());
             }
         }
-        std::lock_guard lock(mutex);
+        MutexLock lock(mutex);
         forgetOnDisk(key);
     }
 
@@ -234,7 +232,7 @@ private:
     {
         if (!openStore()) return;
         if (auto removed = store->remove(key); !removed) failed(removed.error());
-        std::lock_guard lock(mutex);
+        MutexLock lock(mutex);
         forgetOnDisk(key);
     }
 
@@ -242,7 +240,7 @@ private:
     {
         std::vector<std::string> used;
         {
-            std::lock_guard lock(mutex);
+            MutexLock lock(mutex);
             used = memory.takeUsed();
         }
         for (const std::string& key : used) store->noteUse(key);
@@ -272,7 +270,7 @@ private:
         for (const std::string& key : *keys) hashes.insert(hash(key));
         store = std::move(*opened);
         closed = false;
-        std::lock_guard lock(mutex);
+        MutexLock lock(mutex);
         onDisk = std::move(hashes);
         return true;
     }
@@ -280,7 +278,7 @@ private:
     void closeStore()
     {
         store.reset();
-        std::lock_guard lock(mutex);
+        MutexLock lock(mutex);
         onDisk.emplace();
     }
 
@@ -303,16 +301,17 @@ private:
                                error.description());
     }
 
-    std::mutex mutex;
-    MemoryCache memory;                                    // under the mutex
-    std::optional<std::unordered_set<std::size_t>> onDisk; // under the mutex: hashes of the keys, possibly more; empty
-                                                           // until the directory was opened
-    std::unordered_multiset<std::size_t> changing;         // under the mutex: key hashes of pending and running changes
-    std::size_t waitingBytes = 0;                          // under the mutex: bytes that those hold
-    std::unique_ptr<HttpCacheStore> store;                 // queue
-    bool closed = false;                                   // queue: it could not be opened
-    std::uint64_t nextAttempt = 0;                         // queue: host ticks
-    bool failing = false;                                  // queue
+    Mutex mutex;
+    MemoryCache memory GUARDED_BY(mutex);
+    /// Hashes of the keys, possibly more; empty until the directory was opened.
+    std::optional<std::unordered_set<std::size_t>> onDisk GUARDED_BY(mutex);
+    /// Key hashes of pending and running changes.
+    std::unordered_multiset<std::size_t> changing GUARDED_BY(mutex);
+    std::size_t waitingBytes GUARDED_BY(mutex) = 0; ///< bytes that those hold
+    std::unique_ptr<HttpCacheStore> store;          // queue
+    bool closed = false;                            // queue: it could not be opened
+    std::uint64_t nextAttempt = 0;                  // queue: host ticks
+    bool failing = false;                           // queue
 };
 
 HttpCache::HttpCache(std::shared_ptr<Impl> impl) : _impl(std::move(impl)) {}

@@ -7,7 +7,7 @@ namespace platform {
 std::optional<NetworkState> NetworkStatus::current()
 {
     ask();
-    std::lock_guard lock(_mutex);
+    MutexLock lock(_mutex);
     return _state;
 }
 
@@ -15,7 +15,7 @@ NetworkStatus::Token NetworkStatus::observe(Handler handler)
 {
     ask();
     auto token = std::make_shared<const Handler>(std::move(handler));
-    std::lock_guard lock(_mutex);
+    MutexLock lock(_mutex);
     _observers.push_back(token);
     return token;
 }
@@ -24,7 +24,7 @@ void NetworkStatus::set(const NetworkState& state)
 {
     std::vector<Token> told;
     {
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         if (std::exchange(_state, state) == state) return;
         std::erase_if(_observers, [](const auto& observer) { return observer.expired(); });
         for (const auto& observer : _observers) told.push_back(observer.lock());

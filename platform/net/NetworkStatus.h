@@ -7,6 +7,8 @@
 #include <optional>
 #include <vector>
 
+#include "platform/base/Mutex.h"
+
 namespace platform {
 
 /// How the device reaches the network.
@@ -42,9 +44,9 @@ private:
 
     std::once_flag _asked;
     std::function<void()> _begin;
-    std::mutex _mutex;
-    std::optional<NetworkState> _state;                   // under the mutex
-    std::vector<std::weak_ptr<const Handler>> _observers; // under the mutex
+    Mutex _mutex;
+    std::optional<NetworkState> _state GUARDED_BY(_mutex);
+    std::vector<std::weak_ptr<const Handler>> _observers GUARDED_BY(_mutex);
 };
 
 } // namespace platform

@@ -3,6 +3,7 @@
 #include <mutex>
 #include <utility>
 
+#include "platform/base/Mutex.h"
 #include "platform/net/CurlSupport.h"
 #include "platform/net/HttpCache.h"
 #include "platform/run/Queue.h"
@@ -73,14 +74,16 @@ public:
     /// Creates the load, whose identifier becomes the task's. Call it once, first.
     void prepare()
     {
-        _load = makeLoad(_request);
-        _identifier = _load->identifier();
+        auto load = makeLoad(_request);
+        _identifier = load->identifier();
+        MutexLock lock(_mutex);
+        _load = std::move(load);
     }
 
     void resume() override
     {
         {
-            std::lock_guard lock(_mutex);
+            MutexLock lock(_mutex);
             if (_state != State::Suspended) return;
             _state = State::Asking;
         }
@@ -92,7 +95,7 @@ public:
     {
         std::shared_ptr<UrlTask> load;
         {
-            std::lock_guard lock(_mutex);
+            MutexLock lock(_mutex);
             _cancelled = true;
             if (_state == State::Loading) load = _load;
         }
@@ -104,7 +107,7 @@ public:
     [[nodiscard]] const UrlRequest& originalRequest() const override { return _request; }
     [[nodiscard]] Value timingData() const override
     {
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         return _timing;
     }
 
@@ -135,7 +138,7 @@ private:
         std::shared_ptr<UrlTask> resumed;
         _requested = _cache->now();
         {
-            std::lock_guard lock(_mutex);
+            MutexLock lock(_mutex);
             if (_state == State::Ended || _cancelled) return; // `cancel` completes it
             _state = State::Loading;
             if (other) _load = std::move(other);
@@ -150,7 +153,7 @@ private:
     {
         std::shared_ptr<UrlTask> finished;
         {
-            std::lock_guard lock(_mutex);
+            MutexLock lock(_mutex);
             finished = _load;
         }
         if (!error && data && response) {
@@ -177,7 +180,7 @@ private:
         auto again = makeLoad(_request);
         bool cancelled = false;
         {
-            std::lock_guard lock(_mutex);
+            MutexLock lock(_mutex);
             _load = std::move(again);
             cancelled = _cancelled;
         }
@@ -191,7 +194,7 @@ private:
     {
         std::shared_ptr<CachingTask> self;
         {
-            std::lock_guard lock(_mutex);
+            MutexLock lock(_mutex);
             _state = State::Ended;
             _timing = std::move(timing);
             self = std::move(_self);
@@ -205,7 +208,7 @@ private:
     void end(std::optional<Bytes> data, std::optional<UrlResponse> response, std::optional<Error> error, Value timing)
     {
         {
-            std::lock_guard lock(_mutex);
+            MutexLock lock(_mutex);
             if (_state == State::Loading || _state == State::Ended) return;
             _state = State::Ended;
             _timing = std::move(timing);
@@ -229,12 +232,12 @@ private:
     bool _confirming = false;
     Date _requested;
 
-    mutable std::mutex _mutex;
-    State _state = State::Suspended;    // under the mutex
-    bool _cancelled = false;            // under the mutex
-    std::shared_ptr<UrlTask> _load;     // under the mutex
-    std::shared_ptr<CachingTask> _self; // under the mutex; while it is loading
-    Value _timing;                      // under the mutex
+    mutable Mutex _mutex;
+    State _state GUARDED_BY(_mutex) = State::Suspended;
+    bool _cancelled GUARDED_BY(_mutex) = false;
+    std::shared_ptr<UrlTask> _load GUARDED_BY(_mutex);
+    std::shared_ptr<CachingTask> _self GUARDED_BY(_mutex); ///< while it is loading
+    Value _timing GUARDED_BY(_mutex);
 };
 
 class CachingSession final : public UrlSession {

@@ -10,6 +10,7 @@
 
 #include <curl/curl.h>
 
+#include "platform/base/Mutex.h"
 #include "platform/base/ThreadName.h"
 #include "platform/net/CurlLoad.h"
 #include "platform/net/HttpCache.h"
@@ -54,10 +55,10 @@ private:
     [[nodiscard]] bool readOn();
 
     CURLM* _multi;
-    std::mutex _mutex;
-    std::vector<Command> _commands;                     // under the mutex
-    bool _stopping = false;                             // under the mutex
-    std::thread _thread;                                // started under the mutex
+    Mutex _mutex;
+    std::vector<Command> _commands GUARDED_BY(_mutex);
+    bool _stopping GUARDED_BY(_mutex) = false;
+    std::thread _thread;                                // started under the mutex, joined once
     std::map<CURL*, std::shared_ptr<CurlTask>> _active; // loader thread
     std::vector<CURL*> _spare;                          // loader thread
 };
@@ -91,7 +92,7 @@ public:
     [[nodiscard]] const UrlRequest& originalRequest() const override { return _request; }
     [[nodiscard]] Value timingData() const override
     {
-        std::lock_guard lock(_timingMutex);
+        MutexLock lock(_timingMutex);
         return _timing;
     }
 
@@ -121,7 +122,7 @@ private:
     void complete(CurlLoad::Outcome outcome)
     {
         {
-            std::lock_guard lock(_timingMutex);
+            MutexLock lock(_timingMutex);
             _timing = std::move(outcome.timing);
         }
         _delegateQueue->async([self = shared_from_this(), data = std::move(outcome.data),
@@ -142,8 +143,8 @@ private:
     std::atomic<bool> _started = false; // passed to the loader, or cancelled before
     std::atomic<bool> _cancelled = false;
 
-    mutable std::mutex _timingMutex;
-    Value _timing; // under the mutex
+    mutable Mutex _timingMutex;
+    Value _timing GUARDED_BY(_timingMutex);
 };
 
 Loader::Loader() : _multi(curl_multi_init())
@@ -160,7 +161,7 @@ Loader::~Loader()
 void Loader::start(std::shared_ptr<CurlTask> task)
 {
     {
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         if (!_stopping) {
             _commands.push_back({std::move(task), false});
             if (!_thread.joinable()) _thread = std::thread([this] { run(); });
@@ -173,7 +174,7 @@ void Loader::start(std::shared_ptr<CurlTask> task)
 void Loader::cancel(std::shared_ptr<CurlTask> task)
 {
     {
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         if (_stopping) return;
         _commands.push_back({std::move(task), true});
     }
@@ -183,7 +184,7 @@ void Loader::cancel(std::shared_ptr<CurlTask> task)
 void Loader::stop()
 {
     {
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         _stopping = true;
         if (!_thread.joinable()) return;
     }
@@ -211,7 +212,7 @@ void Loader::takeCommands()
 {
     std::vector<Command> commands;
     {
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         commands.swap(_commands);
     }
     for (Command& command : commands) {
@@ -312,7 +313,7 @@ void Loader::run()
     setThreadNameForLabel("url-loader");
     while (true) {
         {
-            std::lock_guard lock(_mutex);
+            MutexLock lock(_mutex);
             if (_stopping) break;
         }
         takeCommands();

@@ -1,15 +1,16 @@
 #include "platform/run/Group.h"
 
-#include <mutex>
 #include <utility>
 #include <vector>
+
+#include "platform/base/Mutex.h"
 
 namespace platform {
 
 struct Group::Member::State {
-    std::mutex mutex; // guards all below
-    std::size_t inside = 0;
-    std::vector<std::move_only_function<void()>> waiting;
+    Mutex mutex;
+    std::size_t inside GUARDED_BY(mutex) = 0;
+    std::vector<std::move_only_function<void()>> waiting GUARDED_BY(mutex);
 };
 
 Group::Member& Group::Member::operator=(Member&& other) noexcept
@@ -25,7 +26,7 @@ void Group::Member::leave()
     if (!state) return;
     std::vector<std::move_only_function<void()>> ready;
     {
-        const std::lock_guard lock(state->mutex);
+        const MutexLock lock(state->mutex);
         if (--state->inside == 0) ready.swap(state->waiting);
     }
     for (auto& done : ready) done();
@@ -35,7 +36,7 @@ Group::Group() : _state(std::make_shared<Member::State>()) {}
 
 Group::Member Group::enter()
 {
-    const std::lock_guard lock(_state->mutex);
+    const MutexLock lock(_state->mutex);
     ++_state->inside;
     return Member(_state);
 }
@@ -43,7 +44,7 @@ Group::Member Group::enter()
 void Group::notify(std::move_only_function<void()> done)
 {
     {
-        const std::lock_guard lock(_state->mutex);
+        const MutexLock lock(_state->mutex);
         if (_state->inside > 0) return _state->waiting.push_back(std::move(done));
     }
     done();

@@ -1,8 +1,10 @@
 #include "platform/run/NotificationCenter.h"
 
 #include <algorithm>
-#include <mutex>
+#include <atomic>
 #include <vector>
+
+#include "platform/base/Mutex.h"
 
 namespace platform {
 
@@ -11,15 +13,12 @@ struct NotificationCenter::Token::Observer {
     Callback callback;
     const void* sender;
     std::weak_ptr<State> state;
-    /// Held while the callback runs, so that the token's destructor waits for it; recursive, so that the callback may
-    /// destroy its own token.
-    std::recursive_mutex running;
-    bool removed = false; // under `running`
+    std::atomic<bool> removed = false;
 };
 
 struct NotificationCenter::State {
-    std::mutex mutex;
-    std::vector<std::shared_ptr<Token::Observer>> observers;
+    Mutex mutex;
+    std::vector<std::shared_ptr<Token::Observer>> observers GUARDED_BY(mutex);
 };
 
 NotificationCenter::NotificationCenter() : _state(std::make_shared<State>()) {}
@@ -37,12 +36,11 @@ NotificationCenter::Token& NotificationCenter::Token::operator=(Token&& other) n
 NotificationCenter::Token::~Token()
 {
     if (!_observer) return;
+    _observer->removed = true;
     if (const auto state = _observer->state.lock()) {
-        std::lock_guard lock(state->mutex);
+        MutexLock lock(state->mutex);
         std::erase(state->observers, _observer);
     }
-    std::lock_guard lock(_observer->running);
-    _observer->removed = true;
 }
 
 NotificationCenter::Token NotificationCenter::observe(std::string_view name, Callback callback, const void* sender)
@@ -53,7 +51,7 @@ NotificationCenter::Token NotificationCenter::observe(std::string_view name, Cal
     observer->sender = sender;
     observer->state = _state;
     {
-        std::lock_guard lock(_state->mutex);
+        MutexLock lock(_state->mutex);
         _state->observers.push_back(observer);
     }
     Token token;
@@ -65,16 +63,14 @@ void NotificationCenter::post(const Notification& notification) const
 {
     std::vector<std::shared_ptr<Token::Observer>> interested;
     {
-        std::lock_guard lock(_state->mutex);
+        MutexLock lock(_state->mutex);
         std::ranges::copy_if(_state->observers, std::back_inserter(interested), [&](const auto& observer) {
             return observer->name == notification.name &&
                    (!observer->sender || observer->sender == notification.object);
         });
     }
-    for (const auto& observer : interested) {
-        std::lock_guard lock(observer->running);
+    for (const auto& observer : interested)
         if (!observer->removed) observer->callback(notification);
-    }
 }
 
 } // namespace platform

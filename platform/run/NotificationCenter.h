@@ -28,8 +28,9 @@ struct Notification {
 /// In-process notifications. Any thread.
 ///
 /// `post` calls the observers on the posting thread, in the order of their registration, from a snapshot and without a
-/// lock: observers may register, unregister and post. After a token's destructor has returned, its callback neither
-/// runs on another thread nor is called again. A token may be destroyed inside its own callback.
+/// lock: observers may register, unregister and post. A token's destructor does not wait. It prevents further calls of
+/// the callback, but a call on another thread may end later, so callbacks hold their owner weakly. A token may be
+/// destroyed inside its own callback.
 class NotificationCenter {
 public:
     using Callback = std::function<void(const Notification&)>;

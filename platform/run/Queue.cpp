@@ -2,15 +2,14 @@
 
 #include <algorithm>
 #include <atomic>
-#include <condition_variable>
 #include <cstdio>
 #include <cstdlib>
 #include <deque>
-#include <mutex>
 #include <ranges>
 #include <utility>
 #include <vector>
 
+#include "platform/base/Mutex.h"
 #include "platform/base/ThreadName.h"
 #include "platform/run/Clock.h"
 
@@ -57,9 +56,9 @@ struct Suspension {
 };
 
 struct Event::State {
-    std::mutex mutex;
-    bool signalled = false;
-    std::vector<std::weak_ptr<Suspension>> waiters;
+    Mutex mutex;
+    bool signalled GUARDED_BY(mutex) = false;
+    std::vector<std::weak_ptr<Suspension>> waiters GUARDED_BY(mutex);
 };
 
 Event::Event() : _state(std::make_shared<State>()) {}
@@ -69,7 +68,7 @@ void Event::signal()
 {
     std::vector<std::weak_ptr<Suspension>> waiters;
     {
-        std::lock_guard lock(_state->mutex);
+        MutexLock lock(_state->mutex);
         _state->signalled = true;
         waiters.swap(_state->waiters);
     }
@@ -79,13 +78,13 @@ void Event::signal()
 
 bool Event::signalled() const
 {
-    std::lock_guard lock(_state->mutex);
+    MutexLock lock(_state->mutex);
     return _state->signalled;
 }
 
 /// A `sync` caller that waits for its turn. On the caller's stack; touched under the queue's mutex.
 struct SyncWaiter {
-    std::condition_variable wake;
+    Condition wake;
     bool granted = false;  // its turn has come, and it counts as running
     bool mayDrain = false; // no other thread drains the tasks before it
 };
@@ -122,28 +121,32 @@ struct Queue::Core {
     Clock& clock;
     Priority priority;
 
-    std::mutex mutex;
-    std::deque<Entry> entries;
-    std::size_t waiters = 0;                                // entries that are waiting callers
-    std::size_t jobs = 0;                                   // drain jobs handed to the executor and not begun
-    unsigned shared = 0;                                    // shared tasks running
-    bool exclusive = false;                                 // a barrier task running
-    std::vector<std::shared_ptr<Suspension>> suspensions{}; ///< in the order of their continuations
+    Mutex mutex;
+    std::deque<Entry> entries GUARDED_BY(mutex);
+    std::size_t waiters GUARDED_BY(mutex) = 0; ///< entries that are waiting callers
+    std::size_t jobs GUARDED_BY(mutex) = 0;    ///< drain jobs handed to the executor and not begun
+    unsigned shared GUARDED_BY(mutex) = 0;     ///< shared tasks running
+    bool exclusive GUARDED_BY(mutex) = false;  ///< a barrier task running
+    /// In the order of their continuations.
+    std::vector<std::shared_ptr<Suspension>> suspensions GUARDED_BY(mutex){};
 
-    [[nodiscard]] bool mayStart(bool barrier) const
+    [[nodiscard]] bool mayStart(bool barrier) const REQUIRES(mutex)
     {
         return suspensions.empty() && !exclusive && (!barrier || shared == 0);
     }
-    [[nodiscard]] bool headMayStart() const { return !entries.empty() && mayStart(entries.front().barrier); }
+    [[nodiscard]] bool headMayStart() const REQUIRES(mutex)
+    {
+        return !entries.empty() && mayStart(entries.front().barrier);
+    }
 
-    void begin(bool barrier)
+    void begin(bool barrier) REQUIRES(mutex)
     {
         if (barrier)
             exclusive = true;
         else
             ++shared;
     }
-    void end(bool barrier)
+    void end(bool barrier) REQUIRES(mutex)
     {
         if (barrier)
             exclusive = false;
@@ -151,7 +154,7 @@ struct Queue::Core {
             --shared;
     }
 
-    Entry take()
+    Entry take() REQUIRES(mutex)
     {
         Entry entry = std::move(entries.front());
         entries.pop_front();
@@ -160,18 +163,18 @@ struct Queue::Core {
         return entry;
     }
 
-    void pump(Jobs& handedOver)
+    void pump(Jobs& handedOver) REQUIRES(mutex)
     {
         while (headMayStart() && entries.front().waiter) {
             SyncWaiter* waiter = take().waiter;
             waiter->granted = true;
-            waiter->wake.notify_one();
+            waiter->wake.notifyOne();
         }
         if (!headMayStart()) return;
         if (waiters > 0) {
             const auto first = std::ranges::find_if(entries, [](const Entry& entry) { return entry.waiter; });
             first->waiter->mayDrain = true;
-            first->waiter->wake.notify_one();
+            first->waiter->wake.notifyOne();
             if (kind == Kind::Serial) return;
         }
         const std::size_t wanted = kind == Kind::Serial ? 1 : std::min(entries.size() - waiters, kMaximumJobs);
@@ -179,16 +182,39 @@ struct Queue::Core {
     }
 
     /// Runs a task with the mutex released; the task is destroyed before it is taken again.
-    void run(Queue& queue, Entry entry, std::unique_lock<std::mutex>& lock)
+    void run(Queue& queue, Entry entry) REQUIRES(mutex)
     {
-        lock.unlock();
+        mutex.unlock();
         {
             Frame frame(&queue);
             Task task = std::move(entry.task);
             task();
         }
-        lock.lock();
+        mutex.lock();
         end(entry.barrier);
+    }
+
+    /// Returns when a caller of `sync` may run its task, which then counts as running.
+    void awaitTurn(Queue& queue, bool barrier, Jobs& handedOver)
+    {
+        MutexLock lock(mutex);
+        if (entries.empty() && mayStart(barrier)) return begin(barrier);
+        SyncWaiter self;
+        entries.push_back({.waiter = &self, .barrier = barrier});
+        ++waiters;
+        while (!self.granted) {
+            if (!headMayStart()) {
+                while (!self.granted && !self.mayDrain) self.wake.wait(mutex);
+                self.mayDrain = false;
+            } else if (entries.front().waiter) {
+                pump(handedOver);
+                mutex.unlock();
+                handedOver.submit();
+                mutex.lock();
+            } else {
+                run(queue, take());
+            }
+        }
     }
 
     /// A drain job, on a worker.
@@ -196,9 +222,9 @@ struct Queue::Core {
     {
         setThreadNameForLabel(label);
         Jobs handedOver(queue);
-        std::unique_lock lock(mutex);
+        MutexLock lock(mutex);
         --jobs;
-        for (unsigned i = 0; i < kBatch && headMayStart() && !entries.front().waiter; ++i) run(queue, take(), lock);
+        for (unsigned i = 0; i < kBatch && headMayStart() && !entries.front().waiter; ++i) run(queue, take());
         pump(handedOver);
     }
 };
@@ -228,7 +254,7 @@ const std::string& Queue::label() const
 void Queue::async(Task task)
 {
     Jobs handedOver(*this);
-    std::lock_guard lock(_core->mutex);
+    MutexLock lock(_core->mutex);
     _core->entries.push_back({.task = std::move(task), .barrier = _core->kind == Kind::Serial});
     _core->pump(handedOver);
 }
@@ -236,7 +262,7 @@ void Queue::async(Task task)
 void Queue::barrierAsync(Task task)
 {
     Jobs handedOver(*this);
-    std::lock_guard lock(_core->mutex);
+    MutexLock lock(_core->mutex);
     _core->entries.push_back({.task = std::move(task), .barrier = true});
     _core->pump(handedOver);
 }
@@ -248,35 +274,12 @@ void Queue::runSync(TaskRef task, bool barrier)
     barrier = barrier || core.kind == Kind::Serial;
 
     Jobs handedOver(*this);
-    std::unique_lock lock(core.mutex);
-    if (core.entries.empty() && core.mayStart(barrier)) {
-        core.begin(barrier);
-    } else {
-        SyncWaiter self;
-        core.entries.push_back({.waiter = &self, .barrier = barrier});
-        ++core.waiters;
-        while (!self.granted) {
-            if (!core.headMayStart()) {
-                self.wake.wait(lock, [&] { return self.granted || self.mayDrain; });
-                self.mayDrain = false;
-                continue;
-            }
-            if (core.entries.front().waiter) {
-                core.pump(handedOver);
-                lock.unlock();
-                handedOver.submit();
-                lock.lock();
-                continue;
-            }
-            core.run(*this, core.take(), lock);
-        }
-    }
-    lock.unlock();
+    core.awaitTurn(*this, barrier, handedOver);
     {
         Frame frame(this);
         task();
     }
-    lock.lock();
+    MutexLock lock(core.mutex);
     core.end(barrier);
     core.pump(handedOver);
 }
@@ -299,19 +302,19 @@ void Queue::suspendUntil(const Event& event, Duration timeout, Task continuation
         Core& core = *over.queue->_core;
         core.clock.cancel(over.timer);
         Jobs handedOver(*over.queue);
-        std::lock_guard lock(core.mutex);
+        MutexLock lock(core.mutex);
         if (!std::ranges::all_of(core.suspensions, [](const auto& other) { return other->over.load(); })) return;
         for (const auto& ended : std::exchange(core.suspensions, {}) | std::views::reverse)
             core.entries.push_front({.task = std::move(ended->continuation), .barrier = true});
         core.pump(handedOver);
     };
     {
-        std::lock_guard lock(_core->mutex);
+        MutexLock lock(_core->mutex);
         _core->suspensions.push_back(suspension);
     }
     suspension->timer = _core->clock.after(timeout, [suspension] { suspension->resume(); });
     {
-        std::lock_guard lock(event._state->mutex);
+        MutexLock lock(event._state->mutex);
         if (!event._state->signalled) {
             std::erase_if(event._state->waiters, [](const auto& waiter) { return waiter.expired(); });
             event._state->waiters.push_back(suspension);

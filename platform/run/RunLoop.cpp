@@ -3,7 +3,6 @@
 #include <atomic>
 #include <csignal>
 #include <cstdlib>
-#include <mutex>
 #include <pthread.h>
 #include <sys/epoll.h>
 #include <sys/eventfd.h>
@@ -13,6 +12,7 @@
 #include <systemd/sd-event.h>
 
 #include "platform/base/FileHandle.h"
+#include "platform/base/Mutex.h"
 
 namespace platform {
 
@@ -47,8 +47,8 @@ struct RunLoop::Impl {
     sd_event* event = nullptr;
     FileHandle wakeFd;
     std::unique_ptr<Watch> wakeWatch;
-    std::mutex mutex;
-    std::vector<Job> jobs; // under the mutex
+    Mutex mutex;
+    std::vector<Job> jobs GUARDED_BY(mutex);
     struct Signal {
         std::move_only_function<void()> handler;
         sd_event_source* source = nullptr;
@@ -59,7 +59,7 @@ struct RunLoop::Impl {
     {
         std::vector<Job> ready;
         {
-            std::lock_guard lock(mutex);
+            MutexLock lock(mutex);
             ready.swap(jobs);
         }
         for (Job& job : ready) job();
@@ -102,7 +102,7 @@ void RunLoop::execute(Priority, Job job)
 {
     bool first = false;
     {
-        std::lock_guard lock(_impl->mutex);
+        MutexLock lock(_impl->mutex);
         first = _impl->jobs.empty();
         _impl->jobs.push_back(std::move(job));
     }

@@ -4,13 +4,13 @@
 #include <ctime>
 #include <fstream>
 #include <map>
-#include <mutex>
 #include <sys/epoll.h>
 #include <sys/timerfd.h>
 #include <unistd.h>
 #include <vector>
 
 #include "platform/base/FileHandle.h"
+#include "platform/base/Mutex.h"
 #include "platform/run/Clock.h"
 #include "platform/run/RunLoop.h"
 
@@ -39,7 +39,7 @@ public:
     TimerId after(Duration delay, std::move_only_function<void()> fire) override
     {
         const std::uint64_t due = hostTicks() + static_cast<std::uint64_t>(std::max(delay, Duration::zero()).count());
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         const TimerId id = ++_lastId;
         _timers.emplace(Key{due, id}, std::move(fire));
         _dueById.emplace(id, due);
@@ -50,7 +50,7 @@ public:
     bool cancel(TimerId timer) override
     {
         std::move_only_function<void()> dropped; // destroyed outside the lock
-        std::lock_guard lock(_mutex);
+        MutexLock lock(_mutex);
         const auto found = _dueById.find(timer);
         if (found == _dueById.end()) return false;
         const auto entry = _timers.find(Key{found->second, timer});
@@ -84,7 +84,7 @@ private:
     };
 
     /// Sets the descriptor to the first timer, or to none.
-    void arm()
+    void arm() REQUIRES(_mutex)
     {
         itimerspec when{};
         if (!_timers.empty()) {
@@ -101,7 +101,7 @@ private:
         if (read(_timerFd.fd(), &expirations, sizeof expirations) < 0 && errno != EAGAIN) return;
         std::vector<std::move_only_function<void()>> due;
         {
-            std::lock_guard lock(_mutex);
+            MutexLock lock(_mutex);
             const std::uint64_t now = hostTicks();
             while (!_timers.empty() && _timers.begin()->first.due <= now) {
                 due.push_back(std::move(_timers.begin()->second));
@@ -114,10 +114,10 @@ private:
     }
 
     FileHandle _timerFd;
-    std::mutex _mutex;
-    std::map<Key, std::move_only_function<void()>> _timers;
-    std::map<TimerId, std::uint64_t> _dueById;
-    TimerId _lastId = 0;
+    Mutex _mutex;
+    std::map<Key, std::move_only_function<void()>> _timers GUARDED_BY(_mutex);
+    std::map<TimerId, std::uint64_t> _dueById GUARDED_BY(_mutex);
+    TimerId _lastId GUARDED_BY(_mutex) = 0;
     std::unique_ptr<RunLoop::Watch> _watch;
 };
 

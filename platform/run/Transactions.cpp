@@ -1,12 +1,12 @@
 #include "platform/run/Transactions.h"
 
-#include <mutex>
+#include "platform/base/Mutex.h"
 
 namespace platform {
 
 struct Transactions::State {
-    std::mutex mutex;
-    std::map<std::string, int> open;
+    Mutex mutex;
+    std::map<std::string, int> open GUARDED_BY(mutex);
 };
 
 Transactions::Transactions() : _state(std::make_shared<State>()) {}
@@ -14,12 +14,12 @@ Transactions::Transactions() : _state(std::make_shared<State>()) {}
 Transactions::Token Transactions::begin(std::string name)
 {
     {
-        std::lock_guard lock(_state->mutex);
+        MutexLock lock(_state->mutex);
         ++_state->open[name];
     }
     Token token;
     token._end = std::shared_ptr<void>(nullptr, [state = _state, name = std::move(name)](void*) {
-        std::lock_guard lock(state->mutex);
+        MutexLock lock(state->mutex);
         const auto found = state->open.find(name);
         if (--found->second == 0) state->open.erase(found);
     });
@@ -28,7 +28,7 @@ Transactions::Token Transactions::begin(std::string name)
 
 std::map<std::string, int> Transactions::open() const
 {
-    std::lock_guard lock(_state->mutex);
+    MutexLock lock(_state->mutex);
     return _state->open;
 }
 

@@ -1,7 +1,6 @@
 #include "platform/run/WorkerPool.h"
 
 #include <deque>
-#include <mutex>
 #include <pthread.h>
 #include <semaphore.h>
 #include <string>
@@ -9,6 +8,7 @@
 #include <thread>
 #include <vector>
 
+#include "platform/base/Mutex.h"
 #include "platform/base/ThreadName.h"
 #include "platform/run/Queue.h"
 
@@ -43,7 +43,7 @@ public:
     {
         std::deque<Executor::Job> dropped;
         {
-            std::lock_guard lock(_mutex);
+            MutexLock lock(_mutex);
             _stopping = true;
             dropped.swap(_jobs);
         }
@@ -54,7 +54,7 @@ public:
     void add(Executor::Job job, bool urgent)
     {
         {
-            std::lock_guard lock(_mutex);
+            MutexLock lock(_mutex);
             if (_stopping) return;
             if (urgent)
                 _jobs.push_front(std::move(job));
@@ -76,7 +76,7 @@ private:
             _tokens.take();
             Executor::Job job;
             {
-                std::lock_guard lock(_mutex);
+                MutexLock lock(_mutex);
                 if (_stopping) return;
                 --_idle;
                 job = std::move(_jobs.front());
@@ -84,7 +84,7 @@ private:
             }
             job();
             job = {};
-            std::lock_guard lock(_mutex);
+            MutexLock lock(_mutex);
             ++_idle;
         }
     }
@@ -92,11 +92,11 @@ private:
     const unsigned _limit;
     const int _nice;
     Tokens _tokens; // one per job
-    std::mutex _mutex;
-    std::deque<Executor::Job> _jobs;
-    std::size_t _idle = 0; ///< threads without a job
-    bool _stopping = false;
-    std::vector<std::thread> _threads;
+    Mutex _mutex;
+    std::deque<Executor::Job> _jobs GUARDED_BY(_mutex);
+    std::size_t _idle GUARDED_BY(_mutex) = 0; ///< threads without a job
+    bool _stopping GUARDED_BY(_mutex) = false;
+    std::vector<std::thread> _threads; // grows under the mutex
 };
 
 constexpr int kBackgroundNice = 10;

@@ -28,7 +28,7 @@ Bag::Bag(std::string base) : _base(std::move(base))
 
 Value Bag::document() const
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     Dictionary bag{
         {"version", _version},
         {"isEnabled", true},
@@ -59,19 +59,19 @@ Value Bag::document() const
 
 std::int64_t Bag::version() const
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     return _version;
 }
 
 std::int64_t Bag::bump()
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     return ++_version;
 }
 
 std::expected<std::int64_t, std::string> Bag::bumpResources(const std::string& name)
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     if (!name.empty()) {
         const auto found = _resourceVersions.find(name);
         if (found == _resourceVersions.end())
@@ -88,7 +88,7 @@ std::expected<void, std::string> Bag::merge(const Value& keys)
 {
     const Dictionary* entries = keys.asDictionary();
     if (!entries) return std::unexpected("give a JSON object of bag keys; null removes a key");
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     Dictionary merged = _overrides;
     std::int64_t version = _version;
     for (const auto& [key, value] : *entries) {
@@ -109,7 +109,7 @@ std::expected<void, std::string> Bag::merge(const Value& keys)
 
 void Bag::reset()
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     _overrides = {};
 }
 

@@ -6,6 +6,7 @@
 #include <mutex>
 #include <string>
 
+#include "platform/base/Mutex.h"
 #include "platform/values/Dictionary.h"
 #include "platform/values/Value.h"
 
@@ -33,10 +34,10 @@ public:
 
 private:
     const std::string _base;
-    mutable std::mutex _mutex;
-    std::int64_t _version = 1;
-    std::map<std::string, std::int64_t, std::less<>> _resourceVersions; ///< by name of the resource
-    platform::Dictionary _overrides;
+    mutable platform::Mutex _mutex;
+    std::int64_t _version GUARDED_BY(_mutex) = 1;
+    std::map<std::string, std::int64_t, std::less<>> _resourceVersions GUARDED_BY(_mutex); ///< by name of the resource
+    platform::Dictionary _overrides GUARDED_BY(_mutex);
 };
 
 } // namespace devserver

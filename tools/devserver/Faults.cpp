@@ -177,7 +177,7 @@ std::expected<void, std::string> Faults::add(std::string_view endpoint, std::str
             fmt::format("no endpoint \"{}\": give one of {}, or *", endpoint, fmt::join(endpointNames(), ", ")));
     auto faults = parseFaults(fault);
     if (!faults) return std::unexpected(faults.error());
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     if (_rules.size() == kMaximumCount)
         return std::unexpected(fmt::format("{} faults wait already: POST /control/faults/clear", kMaximumCount));
     _rules.push_back({std::string(endpoint), std::string(fault), std::move(*faults), count});
@@ -186,7 +186,7 @@ std::expected<void, std::string> Faults::add(std::string_view endpoint, std::str
 
 std::vector<Fault> Faults::take(std::string_view endpoint)
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     const auto rule =
         std::ranges::find_if(_rules, [&](const Rule& r) { return r.endpoint == endpoint || r.endpoint == "*"; });
     if (rule == _rules.end()) return {};
@@ -198,13 +198,13 @@ std::vector<Fault> Faults::take(std::string_view endpoint)
 
 void Faults::clear()
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     _rules.clear();
 }
 
 Value Faults::list() const
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     Value::Array rules;
     for (const Rule& rule : _rules)
         rules.push_back(Value::dictionaryOf({{"endpoint", rule.endpoint}, {"fault", rule.text}, {"left", rule.left}}));
@@ -213,7 +213,7 @@ Value Faults::list() const
 
 std::size_t Faults::count() const
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     return _rules.size();
 }
 

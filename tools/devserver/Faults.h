@@ -8,6 +8,7 @@
 #include <string_view>
 #include <vector>
 
+#include "platform/base/Mutex.h"
 #include "platform/values/Value.h"
 #include "tools/devserver/Http.h"
 
@@ -70,8 +71,8 @@ private:
         std::vector<Fault> faults;
         std::uint64_t left;
     };
-    mutable std::mutex _mutex;
-    std::deque<Rule> _rules;
+    mutable platform::Mutex _mutex;
+    std::deque<Rule> _rules GUARDED_BY(_mutex);
 };
 
 } // namespace devserver

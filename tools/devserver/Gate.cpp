@@ -33,7 +33,7 @@ Gate::Outcome Gate::wait(std::optional<std::chrono::milliseconds> time, int conn
 {
     std::shared_ptr<platform::FileHandle> event;
     {
-        const std::lock_guard lock(_mutex);
+        const platform::MutexLock lock(_mutex);
         if (_closed) return Outcome::Released;
         event = _event;
     }
@@ -49,13 +49,13 @@ Gate::Outcome Gate::wait(std::optional<std::chrono::milliseconds> time, int conn
 
 void Gate::release()
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     if (!_closed) eventfd_write(std::exchange(_event, newEvent())->fd(), 1);
 }
 
 void Gate::close()
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     _closed = true;
     eventfd_write(_event->fd(), 1);
 }

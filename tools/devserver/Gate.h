@@ -5,6 +5,7 @@
 #include <mutex>
 #include <optional>
 
+#include "platform/base/Mutex.h"
 #include "platform/files/Files.h"
 
 namespace devserver {
@@ -26,9 +27,10 @@ public:
     void close();
 
 private:
-    std::mutex _mutex;
-    std::shared_ptr<platform::FileHandle> _event; // an eventfd, signalled once; later waiters get a new one
-    bool _closed = false;
+    platform::Mutex _mutex;
+    /// An eventfd, signalled once; later waiters get a new one.
+    std::shared_ptr<platform::FileHandle> _event GUARDED_BY(_mutex);
+    bool _closed GUARDED_BY(_mutex) = false;
 };
 
 } // namespace devserver

@@ -35,7 +35,7 @@ void RequestLog::add(std::string_view endpoint, const Request& request)
                                        {"query", request.query},
                                        {"secure", request.secure},
                                        {"headers", describeHeaders(request.headers)}});
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     ++_total;
     ++_counts[std::string(endpoint)];
     value.mutableDictionary().set("number", ++_lastNumber);
@@ -45,7 +45,7 @@ void RequestLog::add(std::string_view endpoint, const Request& request)
 
 Value RequestLog::list(std::string_view endpoint, std::uint64_t since, std::size_t count) const
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     Value::Array requests;
     for (auto kept = _kept.rbegin(); kept != _kept.rend() && kept->number > since && requests.size() < count; ++kept)
         if (endpoint.empty() || kept->endpoint == endpoint) requests.push_back(kept->value);
@@ -55,13 +55,13 @@ Value RequestLog::list(std::string_view endpoint, std::uint64_t since, std::size
 
 std::uint64_t RequestLog::total() const
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     return _total;
 }
 
 Value RequestLog::byEndpoint() const
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     platform::Dictionary counts;
     for (const auto& [endpoint, count] : _counts) counts.set(endpoint, count);
     return counts;
@@ -69,7 +69,7 @@ Value RequestLog::byEndpoint() const
 
 void RequestLog::clear()
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     _total = 0;
     _counts.clear();
     _kept.clear();

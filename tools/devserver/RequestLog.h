@@ -7,6 +7,7 @@
 #include <string>
 #include <string_view>
 
+#include "platform/base/Mutex.h"
 #include "platform/values/Value.h"
 #include "tools/devserver/Http.h"
 
@@ -34,11 +35,11 @@ private:
         std::string endpoint;
         platform::Value value;
     };
-    mutable std::mutex _mutex;
-    std::uint64_t _lastNumber = 0;
-    std::uint64_t _total = 0;
-    std::map<std::string, std::uint64_t, std::less<>> _counts;
-    std::deque<Kept> _kept;
+    mutable platform::Mutex _mutex;
+    std::uint64_t _lastNumber GUARDED_BY(_mutex) = 0;
+    std::uint64_t _total GUARDED_BY(_mutex) = 0;
+    std::map<std::string, std::uint64_t, std::less<>> _counts GUARDED_BY(_mutex);
+    std::deque<Kept> _kept GUARDED_BY(_mutex);
 };
 
 /// Returns the first 100 headers as a JSON object. Hides the values of headers with credentials.

@@ -95,7 +95,7 @@ std::string Uploads::add(Upload upload, const Answer& answer)
     const std::size_t events = upload.json["fb"].count();
     const bool taken = answer.status == 200 && !answer.cut;
 
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     // A wrong digest does not identify the upload, so its repeats are not counted.
     Seen none;
     Seen& seen = upload.digestFits ? _seen(*upload.digest) : none;
@@ -139,7 +139,7 @@ std::string Uploads::add(Upload upload, const Answer& answer)
 
 Value Uploads::list() const
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     Value::Array uploads;
     for (const Kept& kept : _kept) uploads.push_back(kept.value);
     return uploads;
@@ -147,7 +147,7 @@ Value Uploads::list() const
 
 Value Uploads::totals() const
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     return Value::dictionaryOf({{"received", _totals.received},
                                 {"taken", _totals.taken},
                                 {"refused", _totals.received - _totals.taken},
@@ -157,7 +157,7 @@ Value Uploads::totals() const
 
 void Uploads::clear()
 {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     _totals = {};
     _digests.clear();
     _digestsByAge.clear();

@@ -8,6 +8,7 @@
 #include <optional>
 #include <string>
 
+#include "platform/base/Mutex.h"
 #include "platform/values/Value.h"
 #include "tools/devserver/Http.h"
 #include "tools/shared/Inflate.h"
@@ -63,15 +64,15 @@ private:
         std::size_t size;
         platform::Value value;
     };
-    Seen& _seen(const std::string& digest);
+    Seen& _seen(const std::string& digest) REQUIRES(_mutex);
 
-    mutable std::mutex _mutex;
-    std::uint64_t _lastNumber = 0;
-    Totals _totals;
-    std::map<std::string, Seen> _digests;
-    std::deque<std::string> _digestsByAge;
-    std::size_t _keptBytes = 0; // decompressed
-    std::deque<Kept> _kept;
+    mutable platform::Mutex _mutex;
+    std::uint64_t _lastNumber GUARDED_BY(_mutex) = 0;
+    Totals _totals GUARDED_BY(_mutex);
+    std::map<std::string, Seen> _digests GUARDED_BY(_mutex);
+    std::deque<std::string> _digestsByAge GUARDED_BY(_mutex);
+    std::size_t _keptBytes GUARDED_BY(_mutex) = 0; // decompressed
+    std::deque<Kept> _kept GUARDED_BY(_mutex);
 };
 
 } // namespace devserver

@@ -1,0 +1,95 @@
+#pragma once
+
+#include <condition_variable>
+#include <mutex>
+#include <shared_mutex>
+
+/// Clang checks these attributes (-Wthread-safety); other compilers skip them. A member that is GUARDED_BY a mutex is
+/// only touched while the thread holds that, and a function that REQUIRES it is only called then.
+#ifdef __clang__
+#define THREAD_SAFETY(...) __attribute__((__VA_ARGS__))
+#else
+#define THREAD_SAFETY(...)
+#endif
+#define GUARDED_BY(mutex) THREAD_SAFETY(guarded_by(mutex))
+#define REQUIRES(...) THREAD_SAFETY(requires_capability(__VA_ARGS__))
+#define EXCLUDES(...) THREAD_SAFETY(locks_excluded(__VA_ARGS__))
+
+namespace platform {
+
+/// A lock for the few states that no queue guards. Held for a few lines: nothing is waited for, and no callback is run,
+/// under it. Not recursive.
+class THREAD_SAFETY(capability("mutex")) Mutex {
+public:
+    Mutex() = default;
+    Mutex(const Mutex&) = delete;
+    Mutex& operator=(const Mutex&) = delete;
+
+    void lock() THREAD_SAFETY(acquire_capability()) { _mutex.lock(); }
+    void unlock() THREAD_SAFETY(release_capability()) { _mutex.unlock(); }
+
+private:
+    friend class Condition;
+    std::mutex _mutex;
+};
+
+/// A Mutex that one writer or several readers hold.
+class THREAD_SAFETY(capability("mutex")) SharedMutex {
+public:
+    SharedMutex() = default;
+    SharedMutex(const SharedMutex&) = delete;
+    SharedMutex& operator=(const SharedMutex&) = delete;
+
+    void lock() THREAD_SAFETY(acquire_capability()) { _mutex.lock(); }
+    void unlock() THREAD_SAFETY(release_capability()) { _mutex.unlock(); }
+    void lock_shared() THREAD_SAFETY(acquire_shared_capability()) { _mutex.lock_shared(); }
+    void unlock_shared() THREAD_SAFETY(release_shared_capability()) { _mutex.unlock_shared(); }
+
+private:
+    std::shared_mutex _mutex;
+};
+
+/// Holds a mutex as its only owner for as long as this lives.
+template <class M = Mutex> class THREAD_SAFETY(scoped_lockable) MutexLock {
+public:
+    explicit MutexLock(M& mutex) THREAD_SAFETY(acquire_capability(mutex)) : _mutex(mutex) { _mutex.lock(); }
+    ~MutexLock() THREAD_SAFETY(release_capability()) { _mutex.unlock(); }
+    MutexLock(const MutexLock&) = delete;
+    MutexLock& operator=(const MutexLock&) = delete;
+
+private:
+    M& _mutex;
+};
+
+/// Holds a mutex as one of its readers for as long as this lives.
+class THREAD_SAFETY(scoped_lockable) SharedMutexLock {
+public:
+    explicit SharedMutexLock(SharedMutex& mutex) THREAD_SAFETY(acquire_shared_capability(mutex)) : _mutex(mutex)
+    {
+        _mutex.lock_shared();
+    }
+    ~SharedMutexLock() THREAD_SAFETY(release_generic_capability()) { _mutex.unlock_shared(); }
+    SharedMutexLock(const SharedMutexLock&) = delete;
+    SharedMutexLock& operator=(const SharedMutexLock&) = delete;
+
+private:
+    SharedMutex& _mutex;
+};
+
+/// Lets a thread that holds a mutex wait for a state that the mutex guards. wait() may return without a notification:
+/// the caller looks at the state in a loop.
+class Condition {
+public:
+    void wait(Mutex& mutex) REQUIRES(mutex)
+    {
+        std::unique_lock lock(mutex._mutex, std::adopt_lock);
+        _condition.wait(lock);
+        lock.release();
+    }
+    void notifyOne() { _condition.notify_one(); }
+
+private:
+    std::condition_variable _condition;
+};
+
+} // namespace platform
