@@ -24,7 +24,7 @@ using platform::ActivityState;
 namespace {
 
 constexpr const char* kActivity = "com.quorvane.tavrind.flusher.background";
-constexpr std::chrono::seconds kDelay = 300s;
+constexpr std::chrono::seconds kEarliestStart = 300s;
 constexpr std::chrono::seconds kInterval = 600s;
 constexpr std::chrono::seconds kGracePeriod = 300s;
 /// Age at which the file of a body counts as abandoned: no body takes that long to write.
@@ -33,7 +33,7 @@ constexpr std::chrono::hours kOldBody(1);
 platform::ActivityCriteria criteria()
 {
     platform::ActivityCriteria criteria = TavrinXPCCriteria::createCriteria();
-    TavrinXPCCriteria::setDelay(kDelay, criteria);
+    TavrinXPCCriteria::setDelay(kEarliestStart, criteria);
     TavrinXPCCriteria::setInterval(kInterval, criteria);
     TavrinXPCCriteria::setGracePeriod(kGracePeriod, criteria);
     TavrinXPCCriteria::setRepeating(true, criteria);

@@ -18,7 +18,7 @@ namespace {
 using platform::Dictionary;
 using platform::Value;
 
-constexpr std::string_view kPrefix = "_kCFNTimingData";
+constexpr std::string_view kStatisticPrefix = "_kCFNTimingData";
 constexpr std::string_view kStatisticsPrefix = "_kCFNTimingDataNStat";
 constexpr std::string_view kFastOpenStatistics = "_kCFNTimingDataTCPFastOpenStats";
 
@@ -61,12 +61,12 @@ Value formatNetworkTimingData(const Value& timingData)
     for (const auto& [key, value] : *data) {
         const Dictionary* entries = value.asDictionary();
         if (isCounts(key)) {
-            if (entries) statistics.push_back({{without(kPrefix, key)}, counts(*entries)});
+            if (entries) statistics.push_back({{without(kStatisticPrefix, key)}, counts(*entries)});
         } else if (key.contains(kFastOpenStatistics)) {
-            if (entries) statistics.push_back({{without(kPrefix, key)}, *entries});
+            if (entries) statistics.push_back({{without(kStatisticPrefix, key)}, *entries});
         } else if (key.contains("Start") || key.contains("End")) {
             const double seconds = value.asDouble().value_or(0);
-            if (seconds != 0 && std::isfinite(seconds)) moments.push_back({{without(kPrefix, key)}, seconds});
+            if (seconds != 0 && std::isfinite(seconds)) moments.push_back({{without(kStatisticPrefix, key)}, seconds});
         }
     }
     std::ranges::stable_sort(moments, {}, &TavrinNetEventTimingFeedback::value);

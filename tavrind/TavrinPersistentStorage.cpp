@@ -19,7 +19,7 @@ namespace fs = std::filesystem;
 
 namespace {
 
-constexpr std::string_view kPrefix = "session.";
+constexpr std::string_view kFilePrefix = "session.";
 constexpr double kDefaultMaxFileSize = 4u << 20;    // bytes
 constexpr double kDefaultMaxFileAge = 48 * 60 * 60; // seconds
 constexpr double kLargestLimit = 1e15;
@@ -43,8 +43,8 @@ double limit(const platform::UserDefaults& userDefaults, std::string_view key, d
 
 std::optional<std::int32_t> sessionNumber(std::string_view fileName)
 {
-    if (!fileName.starts_with(kPrefix)) return std::nullopt;
-    const std::string_view digits = fileName.substr(kPrefix.size());
+    if (!fileName.starts_with(kFilePrefix)) return std::nullopt;
+    const std::string_view digits = fileName.substr(kFilePrefix.size());
     if (digits.empty() || !std::ranges::all_of(digits, [](char c) { return c >= '0' && c <= '9'; }))
         return std::nullopt;
     std::int32_t number = 0;
@@ -84,7 +84,7 @@ void TavrinPersistentStorage::_scanCacheDirectory()
     std::ranges::sort(*names, {}, [](const std::string& name) { return std::pair(sessionNumber(name), name); });
     std::int32_t largest = 0;
     for (const std::string& name : *names)
-        if (name.starts_with(kPrefix)) largest = std::max(largest, _adopt(name).value_or(0));
+        if (name.starts_with(kFilePrefix)) largest = std::max(largest, _adopt(name).value_or(0));
     _handleId = largest + 1;
 }
 
@@ -137,7 +137,7 @@ std::optional<fs::path> TavrinPersistentStorage::_newFileUrl()
         log(kLogFeedbackStorage).error("{}", made.error().description());
         return std::nullopt;
     }
-    return _cachesUrl / (std::string(kPrefix) + std::to_string(_handleId++));
+    return _cachesUrl / (std::string(kFilePrefix) + std::to_string(_handleId++));
 }
 
 std::shared_ptr<FileContainer> TavrinPersistentStorage::createFileContainerForWriting(FileUse use)

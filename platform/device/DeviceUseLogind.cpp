@@ -15,7 +15,7 @@ namespace platform {
 
 namespace {
 
-constexpr const char* kService = "org.freedesktop.login1";
+constexpr const char* kLogind = "org.freedesktop.login1";
 
 /// Returns the first line of a file, or the empty string.
 std::string lineOf(FileSystem& files, const std::filesystem::path& path)
@@ -40,7 +40,7 @@ public:
         }
         _runLoop.execute(Priority::Default, [this] {
             // "auto" is the session of this process or, for a user service, the user's graphical session.
-            _bus.getProperties({kService, "/org/freedesktop/login1/session/auto", "org.freedesktop.login1.Session"},
+            _bus.getProperties({kLogind, "/org/freedesktop/login1/session/auto", "org.freedesktop.login1.Session"},
                                [this](const auto& properties) { answered(properties); });
         });
     }
@@ -55,7 +55,7 @@ private:
     {
         if (!properties) {
             const std::string& error = properties.error().name;
-            const bool noSession = error.starts_with(kService) || error == "org.freedesktop.DBus.Error.UnknownObject";
+            const bool noSession = error.starts_with(kLogind) || error == "org.freedesktop.DBus.Error.UnknownObject";
             return found(false, !noSession || _hadSession);
         }
         const auto is = [&](const char* name, bool otherwise) {

@@ -31,7 +31,7 @@ constexpr std::size_t kMaximumFolders = 1'000; // below one data directory, like
 constexpr std::size_t kMaximumNames = 100'000;
 /// Small, because all processes of a user share the limit of inotify watches.
 constexpr std::size_t kMaximumWatches = 32;
-constexpr std::size_t kMaximumEntrySize = 1u << 20;
+constexpr std::size_t kMaximumDesktopEntry = 1u << 20;
 constexpr std::size_t kMaximumMetadataSize = 4u << 20;
 constexpr Duration kSettleTime = std::chrono::seconds(2);
 constexpr std::string_view kSuffix = ".desktop";
@@ -174,7 +174,7 @@ public:
         for (const fs::path& directory : _dataDirectories) {
             for (const auto& [identifier, path] : EntryFolder(directory / "applications").entries) {
                 if (found.contains(identifier)) continue;
-                const auto entry = readThroughLinks(_files, path, kMaximumEntrySize);
+                const auto entry = readThroughLinks(_files, path, kMaximumDesktopEntry);
                 if (!entry) {
                     defaultLog().info("a desktop entry can't be read: {}", entry.error().description());
                     continue;

@@ -11,7 +11,7 @@ namespace platform {
 
 namespace {
 
-constexpr const char* kService = "org.freedesktop.GeoClue2";
+constexpr const char* kGeoClue = "org.freedesktop.GeoClue2";
 
 // GeoClue's accuracy levels.
 constexpr std::uint32_t kAccuracyCity = 4;
@@ -69,7 +69,7 @@ private:
     {
         if (_allowed.empty() || _isAsking || _client) return;
         _isAsking = true;
-        _bus.call({kService, "/org/freedesktop/GeoClue2/Manager", "org.freedesktop.GeoClue2.Manager"}, "GetClient",
+        _bus.call({kGeoClue, "/org/freedesktop/GeoClue2/Manager", "org.freedesktop.GeoClue2.Manager"}, "GetClient",
                   [this](const ipc::CallResult& result) { gotClient(result); });
     }
 
@@ -79,12 +79,12 @@ private:
         if (_allowed.empty()) return;
         const std::string* path = result && !result->args.empty() ? result->args[0].asString() : nullptr;
         if (!path) return lose(result ? "GeoClue gave no client" : result.error().message, true);
-        _client = {kService, *path, "org.freedesktop.GeoClue2.Client"};
+        _client = {kGeoClue, *path, "org.freedesktop.GeoClue2.Client"};
         _updates = _bus.onSignal(*_client, "LocationUpdated", [this](const ipc::CallResult& places) {
             // The arguments are the old and the new location.
             if (places && places->args.size() == 2 && places->args[1].asString()) read(*places->args[1].asString());
         });
-        _owner = _bus.onOwnerChange(kService, [this] { forget("GeoClue has gone"); });
+        _owner = _bus.onOwnerChange(kGeoClue, [this] { forget("GeoClue has gone"); });
         _bus.setProperty(*_client, "DesktopId", "s", _desktopId);
         _bus.setProperty(*_client, "RequestedAccuracyLevel", "u",
                          _allowed.contains("gps")    ? kAccuracyExact
@@ -97,7 +97,7 @@ private:
 
     void read(const std::string& place)
     {
-        _bus.getProperties({kService, place, "org.freedesktop.GeoClue2.Location"}, [this](const auto& properties) {
+        _bus.getProperties({kGeoClue, place, "org.freedesktop.GeoClue2.Location"}, [this](const auto& properties) {
             if (!properties) return;
             const auto number = [&](const char* name) {
                 const Value* value = properties->find(name);

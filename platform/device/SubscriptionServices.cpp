@@ -18,7 +18,7 @@ namespace platform {
 
 namespace {
 
-constexpr std::size_t kMaximumEntrySize = 4u << 10;
+constexpr std::size_t kMaximumSubscriptionSize = 4u << 10;
 constexpr std::size_t kMaximumFiles = 64;
 
 class SubscriptionFiles final : public SubscriptionServices {
@@ -69,8 +69,8 @@ public:
 private:
     std::optional<Value> read(const std::filesystem::path& path)
     {
-        const auto bytes = _files.read(path, kMaximumEntrySize);
-        const auto value = bytes ? parseJson(bytes->view(), kMaximumEntrySize) : std::unexpected(bytes.error());
+        const auto bytes = _files.read(path, kMaximumSubscriptionSize);
+        const auto value = bytes ? parseJson(bytes->view(), kMaximumSubscriptionSize) : std::unexpected(bytes.error());
         if (!value) {
             defaultLog().error("subscription {} can't be read: {}", path.string(), value.error().description());
             return std::nullopt;

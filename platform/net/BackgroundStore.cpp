@@ -20,13 +20,13 @@ namespace fs = std::filesystem;
 namespace {
 
 constexpr const char* kDatabase = "transfers.db";
-constexpr std::string_view kBodySuffix = ".body";
+constexpr std::string_view kUploadSuffix = ".body";
 constexpr std::string_view kDownloadSuffix = ".download";
 /// Suffix of a copy that a kill interrupted.
-constexpr std::string_view kUnfinishedSuffix = ".tmp";
+constexpr std::string_view kPartialSuffix = ".tmp";
 constexpr std::string_view kTemporaryPrefix = "background-transfers-";
 /// A store with other tables is replaced by an empty one. Times are nanoseconds of lived time.
-constexpr std::array kSchema{
+constexpr std::array kTables{
     "CREATE TABLE task (identifier INTEGER PRIMARY KEY AUTOINCREMENT, upload INTEGER NOT NULL, request TEXT NOT NULL,"
     " requestBody TEXT NOT NULL, bodySize INTEGER NOT NULL, note TEXT, resumed INTEGER NOT NULL,"
     " deadline INTEGER NOT NULL, failures INTEGER NOT NULL, notBefore INTEGER NOT NULL, outcome TEXT)",
@@ -141,7 +141,7 @@ Sqlite::Parameter parameter(const std::optional<std::string>& text)
 /// Returns the identifier in the name of a task's file, or nothing for other files.
 std::optional<std::uint64_t> identifierOf(std::string_view name)
 {
-    const bool ours = name.ends_with(kBodySuffix) || name.ends_with(kDownloadSuffix);
+    const bool ours = name.ends_with(kUploadSuffix) || name.ends_with(kDownloadSuffix);
     std::uint64_t identifier = 0;
     const auto read = std::from_chars(name.data(), name.data() + name.size(), identifier);
     const bool whole = read.ec == std::errc() && *read.ptr == '.';
@@ -213,7 +213,7 @@ Result<void> BackgroundStore::checkDatabase()
     if (done && verdict != "ok")
         done =
             std::unexpected(Error::withReason(std::string(kSqliteErrorDomain), Sqlite::kCorrupt, std::move(verdict)));
-    return done ? _database->adopt(kSchema) : std::move(done);
+    return done ? _database->adopt(kTables) : std::move(done);
 }
 
 Result<void> BackgroundStore::load()
@@ -249,7 +249,7 @@ void BackgroundStore::sweep(const std::vector<StoredTask>& tasks) const
     for (const std::string& name : _files.list(_directory).value_or(std::vector<std::string>())) {
         const auto identifier = identifierOf(name);
         const bool isOwned = identifier && std::ranges::binary_search(tasks, *identifier, {}, &StoredTask::identifier);
-        if (name.ends_with(kUnfinishedSuffix) || (identifier && !isOwned)) (void)_files.remove(_directory / name);
+        if (name.ends_with(kPartialSuffix) || (identifier && !isOwned)) (void)_files.remove(_directory / name);
     }
 }
 
@@ -340,7 +340,7 @@ Result<FileHandle> BackgroundStore::openBody(const StoredTask& task) const
 
 fs::path BackgroundStore::bodyPath(std::uint64_t identifier) const
 {
-    return _directory / fmt::format("{}{}", identifier, kBodySuffix);
+    return _directory / fmt::format("{}{}", identifier, kUploadSuffix);
 }
 
 fs::path BackgroundStore::downloadPath(std::uint64_t identifier) const

@@ -21,7 +21,7 @@ using platform::Value;
 
 namespace {
 
-constexpr std::size_t kMaximumFile = 64u << 20;
+constexpr std::size_t kMaximumEventsFile = 64u << 20;
 constexpr std::size_t kProblemsShown = 20;
 constexpr std::size_t kOutstanding = 64; // reports without an answer before the next one is sent
 
@@ -45,18 +45,18 @@ std::string contents(const std::string& file)
     if (file == "-") {
         std::string text;
         std::array<char, 1u << 16> piece;
-        while (text.size() <= kMaximumFile && std::cin.read(piece.data(), piece.size()).gcount() > 0)
+        while (text.size() <= kMaximumEventsFile && std::cin.read(piece.data(), piece.size()).gcount() > 0)
             text.append(piece.data(), static_cast<std::size_t>(std::cin.gcount()));
-        if (text.size() > kMaximumFile)
-            throw Failure(fmt::format("standard input has more than {} bytes", kMaximumFile));
+        if (text.size() > kMaximumEventsFile)
+            throw Failure(fmt::format("standard input has more than {} bytes", kMaximumEventsFile));
         return text;
     }
-    return readFile(file, kMaximumFile);
+    return readFile(file, kMaximumEventsFile);
 }
 
 std::vector<ReportedEvent> eventsInFile(const std::string& file)
 {
-    const auto json = platform::parseJson(contents(file), kMaximumFile);
+    const auto json = platform::parseJson(contents(file), kMaximumEventsFile);
     if (!json) throw Failure(fmt::format("{} is not JSON: {}", file, json.error().reason()));
     auto events = eventsIn(*json);
     if (events) return std::move(*events);

@@ -16,7 +16,7 @@ using platform::Value;
 
 namespace {
 
-constexpr std::size_t kMaximumFile = 256u << 20;
+constexpr std::size_t kMaximumSessionFile = 256u << 20;
 
 Value describe(const SessionFile& file)
 {
@@ -67,7 +67,7 @@ void printEvents(const SessionFile& file)
 
 void show(const Options& options, const std::string& path)
 {
-    const SessionFile file = readSessionFile(readFile(path, kMaximumFile));
+    const SessionFile file = readSessionFile(readFile(path, kMaximumSessionFile));
     if (options.json) {
         printJson(describe(file));
     } else {
