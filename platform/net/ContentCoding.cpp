@@ -2,7 +2,8 @@
 
 #include <algorithm>
 #include <array>
-#include <strings.h>
+
+#include "platform/net/HttpHeaders.h"
 
 namespace platform {
 
@@ -10,11 +11,6 @@ namespace {
 
 /// Further codings are ignored: each stage takes 40 KiB of memory.
 constexpr std::size_t kMaximumStages = 4;
-
-bool isCoding(std::string_view text, std::string_view name)
-{
-    return text.size() == name.size() && strncasecmp(text.data(), name.data(), name.size()) == 0;
-}
 
 unsigned byteAt(const std::string& text, std::size_t at)
 {
@@ -30,8 +26,8 @@ ContentDecoder::ContentDecoder(std::string_view codings)
         codings.remove_prefix(std::min(coding.size() + 1, codings.size()));
         while (coding.starts_with(' ') || coding.starts_with('\t')) coding.remove_prefix(1);
         while (coding.ends_with(' ') || coding.ends_with('\t')) coding.remove_suffix(1);
-        const bool gzip = isCoding(coding, "gzip") || isCoding(coding, "x-gzip");
-        if (gzip || isCoding(coding, "deflate")) _stages.emplace_front(gzip);
+        const bool gzip = equalIgnoringCase(coding, "gzip") || equalIgnoringCase(coding, "x-gzip");
+        if (gzip || equalIgnoringCase(coding, "deflate")) _stages.emplace_front(gzip);
     }
 }
 

@@ -2,7 +2,6 @@
 
 #include <algorithm>
 #include <array>
-#include <strings.h>
 
 #include <curl/curl.h>
 
@@ -14,11 +13,6 @@ using std::chrono::seconds;
 
 /// About 68 years; larger values count as this one (RFC 9111, 1.2.2).
 constexpr seconds kLongest{std::int64_t{1} << 31};
-
-bool equalIgnoringCase(std::string_view a, std::string_view b)
-{
-    return a.size() == b.size() && strncasecmp(a.data(), b.data(), a.size()) == 0;
-}
 
 std::string_view withoutBlanks(std::string_view text)
 {

@@ -83,7 +83,8 @@ std::optional<std::int64_t> idOf(std::string_view name)
 {
     if (!name.ends_with(kBodySuffix)) return std::nullopt;
     std::int64_t id = 0;
-    const char* end = name.data() + name.size() - kBodySuffix.size();
+    name.remove_suffix(kBodySuffix.size());
+    const char* end = name.data() + name.size();
     const auto read = std::from_chars(name.data(), end, id);
     return read.ec == std::errc() && read.ptr == end ? std::optional(id) : std::nullopt;
 }

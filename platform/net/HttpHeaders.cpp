@@ -1,7 +1,6 @@
 #include "platform/net/HttpHeaders.h"
 
 #include <algorithm>
-#include <strings.h>
 
 #include "platform/net/UrlSession.h"
 
@@ -11,12 +10,16 @@ namespace {
 
 auto named(std::string_view name)
 {
-    return [name](const HttpHeaders::Entry& entry) {
-        return entry.first.size() == name.size() && strncasecmp(entry.first.data(), name.data(), name.size()) == 0;
-    };
+    return [name](const HttpHeaders::Entry& entry) { return equalIgnoringCase(entry.first, name); };
 }
 
 } // namespace
+
+bool equalIgnoringCase(std::string_view a, std::string_view b)
+{
+    const auto lower = [](char c) { return c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c; };
+    return std::ranges::equal(a, b, {}, lower, lower);
+}
 
 const std::string* HttpHeaders::find(std::string_view name) const
 {

@@ -8,6 +8,10 @@
 
 namespace platform {
 
+/// Compares as field names, content codings and directives compare: letters of ASCII regardless of case (RFC
+/// 9110, 5.1).
+[[nodiscard]] bool equalIgnoringCase(std::string_view a, std::string_view b);
+
 /// Header fields in order. Names are compared case-insensitively (RFC 9110, 5.1). A plain value.
 class HttpHeaders {
 public:

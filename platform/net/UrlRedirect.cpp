@@ -5,7 +5,6 @@
 #include <array>
 #include <cstring>
 #include <netinet/in.h>
-#include <strings.h>
 
 #include <fmt/format.h>
 
@@ -92,9 +91,7 @@ bool goesToAnyOrigin(std::string_view name)
 {
     constexpr std::array<std::string_view, 6> kNames{"Accept",        "Accept-Language", "Accept-Encoding",
                                                      "Cache-Control", "Range",           "User-Agent"};
-    return std::ranges::any_of(kNames, [name](std::string_view other) {
-        return name.size() == other.size() && strncasecmp(name.data(), other.data(), name.size()) == 0;
-    });
+    return std::ranges::any_of(kNames, [name](std::string_view other) { return equalIgnoringCase(name, other); });
 }
 
 } // namespace

@@ -1,8 +1,8 @@
 #include "tools/devserver/Http.h"
 
 #include <algorithm>
-#include <strings.h>
 
+#include "platform/net/HttpHeaders.h"
 #include "platform/net/Url.h"
 #include "platform/values/Json.h"
 
@@ -10,9 +10,8 @@ namespace devserver {
 
 const std::string* findHeader(const Headers& headers, std::string_view name)
 {
-    const auto found = std::ranges::find_if(headers, [&](const auto& header) {
-        return header.first.size() == name.size() && strncasecmp(header.first.data(), name.data(), name.size()) == 0;
-    });
+    const auto found = std::ranges::find_if(
+        headers, [&](const auto& header) { return platform::equalIgnoringCase(header.first, name); });
     return found == headers.end() ? nullptr : &found->second;
 }
 
