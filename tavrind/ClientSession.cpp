@@ -106,7 +106,7 @@ bool ClientSession::_updateFirstUseDate()
         return false;
     }
     _assembly.userDefaults.set(*key, *_header.baseTime);
-    _assembly.userDefaults.synchronize();
+    (void)_assembly.userDefaults.synchronize();
     if (const auto client = dailyActiveClient(*key))
         _assembly.diagnosticData.addValue(1, createCounterKey(*client, "dailyactiveusers"));
     return true;

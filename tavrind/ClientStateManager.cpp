@@ -90,7 +90,7 @@ void ClientStateManager::saveState()
     if (!_persistSessions) return;
     stateCacheQueue->async([self = shared_from_this()] {
         self->_assembly.userDefaults.set(kSessionsKey, self->_sessions());
-        self->_assembly.userDefaults.synchronize();
+        (void)self->_assembly.userDefaults.synchronize();
     });
 }
 

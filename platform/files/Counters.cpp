@@ -85,6 +85,7 @@ struct CounterStore::Impl : std::enable_shared_from_this<Impl> {
     void evict() REQUIRES(mutex)
     {
         std::vector<std::pair<std::uint64_t, std::string_view>> byUse;
+        byUse.reserve(counters.size());
         for (const auto& [key, counter] : counters) byUse.emplace_back(counter.uses.load(), key);
         std::ranges::nth_element(byUse, byUse.begin() + kEvicted);
         byUse.resize(kEvicted);

@@ -172,7 +172,7 @@ void Client::call(std::string_view interface, const Member& member, Message argu
         return fail(std::strerror(-result));
     }
     sd_bus_slot_set_destroy_callback(slot, [](void* call) { delete static_cast<Impl::PendingCall*>(call); });
-    pending.release();
+    (void)pending.release(); // the slot owns it
     sd_bus_slot_set_floating(slot, true);
     sd_bus_slot_unref(slot);
 }

@@ -91,9 +91,11 @@ Result<std::size_t> PrivacyRecorder::record(std::string_view key, const std::set
     }
 
     std::vector<std::pair<std::uint64_t, std::string_view>> chosen;
+    chosen.reserve(texts.size());
     for (const std::string& text : texts) chosen.emplace_back(drawn->ranks[chosen.size()], text);
     std::ranges::partial_sort(chosen, chosen.begin() + static_cast<std::ptrdiff_t>(count));
     std::vector<PrivacyReport> reports;
+    reports.reserve(count);
     for (std::size_t i = 0; i < count; ++i)
         reports.push_back(privatised(ledger->secret, key, chosen[i].second, drawn->noise[i]));
 
