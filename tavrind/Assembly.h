@@ -47,8 +47,8 @@ struct Assembly {
     TavrinDiagnosticDataReporter diagnosticData;
     FeedbackBooks feedbackBooks;
 
-    std::shared_ptr<platform::UrlSession> urlSession;                ///< foreground: every request of a client
-    std::shared_ptr<platform::UrlSession> bagSession;                ///< without caching
+    std::shared_ptr<platform::UrlSession> urlSession; ///< foreground: every request of a client
+    std::shared_ptr<platform::UrlSession> bagSession; ///< without caching; unused, the bag comes on urlSession
     std::shared_ptr<platform::BackgroundSession> downloadURLSession; ///< resources
     std::shared_ptr<platform::BackgroundSession> uploadURLSession;   ///< feedback
     platform::UserDefaults& userDefaults;

@@ -44,7 +44,6 @@ using platform::Value;
 
 namespace {
 
-constexpr unsigned kRetries = 3;
 constexpr std::chrono::seconds kDefaultTimeout{60}; ///< the loader's
 
 std::shared_ptr<TAVHTTPRequest> record(const UrlRequest& request)
@@ -201,7 +200,7 @@ void Exchange::_send()
     if (_kind.expires) expire = _assembly.device.clock.wallNow() + _httpRequest.timeout.value_or(kDefaultTimeout);
     dataTaskWithRetryableRequest(
         _assembly.device, _assembly.urlSession, {.httpRequest = _httpRequest, .expire = expire, .delayOnFail = false},
-        1, _kind.retryable ? kRetries : 0,
+        1, _kind.retries,
         [self = shared_from_this()](auto data, auto response, auto error, const Value& timingData) {
             self->_completed(std::move(data), std::move(response), std::move(error), timingData);
         })

@@ -9,7 +9,8 @@
 #include "platform/values/Value.h"
 #include "searchrecords/ZREnums.h"
 
-/// The texts of the records' enumerations as values of an upload. Any thread.
+/// The texts of enumerations as values of an upload. They stand beside the enumerations: those of records in ZREnums.h,
+/// of session ends in TavrinSessionFeedback.h. Any thread.
 namespace tavrin {
 
 /// Returns the texts of an enumeration, by value. They are created on first use; copies share the text.

@@ -34,7 +34,7 @@ struct RequestKind {
     bool isSearch = false; ///< ordered by query id, counted, has a minimum length, may be answered from the cache
     bool needsBag = true;  ///< waits for the first bag, and is not performed if the bag is disabled
     bool skipsWhenDisabled = false; ///< records a skip if the bag is disabled
-    bool retryable = false;         ///< has retries, which take place only if it `expires`
+    unsigned retries = 0;           ///< at most, after a failure; only if the request `expires`
     bool expires = false;           ///< retries end when its time-out has passed since the first attempt
     bool servedOnEndpoint = false;  ///< also served on the endpoint that `configure` returns
     std::optional<platform::UrlRequest> (TAVNetworkRequestFactory::*builder)(const ClientRequest&) = nullptr;
