@@ -5,12 +5,10 @@
 
 #include "platform/device/ActivityPolicy.h"
 #include "platform/device/DeviceUseLogind.h"
+#include "tests/support/ByHand.h"
 #include "tests/support/FakeActivities.h"
-#include "tests/support/ManualClock.h"
-#include "tests/support/ManualExecutor.h"
 #include "tests/support/MemoryFiles.h"
 #include "tests/support/TemporaryDirectory.h"
-#include "tests/support/TestDevice.h"
 
 namespace platform {
 namespace {
@@ -23,29 +21,23 @@ using enum ActivityState;
 TEST(ActivityPolicy, CriteriaLookAtWhatTheyNameOnly)
 {
     const DeviceUse busy{.onBattery = true, .screenInUse = true, .unlocked = false};
-    const struct {
-        ActivityCriteria criteria;
-        bool depend;
-    } cases[]{
+    const std::pair<ActivityCriteria, bool> cases[]{
         {{}, false},
         {{.allowBattery = false}, true},
         {{.requireScreenSleep = true}, true},
         {{.requireFirstUnlock = true}, true},
         {{.repeating = true, .delay = 1s, .maintenance = true}, false},
     };
-    for (const auto& c : cases) {
-        EXPECT_EQ(dependOnUse(c.criteria), c.depend);
-        EXPECT_EQ(criteriaHold(c.criteria, busy), !c.depend);
-        EXPECT_TRUE(criteriaHold(c.criteria, {}));
+    for (const auto& [criteria, depend] : cases) {
+        EXPECT_EQ(dependOnUse(criteria), depend);
+        EXPECT_EQ(criteriaHold(criteria, busy), !depend);
+        EXPECT_TRUE(criteriaHold(criteria, {}));
     }
 }
 
 TEST(ActivityPolicy, WakesOnceForAllThatCanBeTogether)
 {
-    const struct {
-        std::vector<ActivityWindow> windows;
-        std::optional<Duration> wake;
-    } cases[]{
+    const std::pair<std::vector<ActivityWindow>, std::optional<Duration>> cases[]{
         {{}, std::nullopt},
         {{{100s, 300s}}, 100s},
         {{{100s, 300s}, {250s, 0s}}, 250s},
@@ -55,26 +47,21 @@ TEST(ActivityPolicy, WakesOnceForAllThatCanBeTogether)
         {{{100s, 300s}, {200s, 50s}, {240s, 100s}, {260s, 0s}}, 240s},
         {{{-5s, 0s}, {10s, 0s}}, -5s},
     };
-    for (const auto& c : cases) EXPECT_EQ(wakeTime(c.windows), c.wake) << c.windows.size();
+    for (const auto& [windows, wake] : cases) EXPECT_EQ(wakeTime(windows), wake) << windows.size();
 }
 
 TEST(ActivityPolicy, TheFirstRunComesAfterTheDelayAndWhenAnEarlierProcessSaid)
 {
     const ActivityCriteria repeating{.repeating = true, .delay = 300s, .interval = 600s};
-    const struct {
-        std::optional<Duration> kept;
-        Duration due;
-    } cases[]{{std::nullopt, 1300s}, {900s, 1300s}, {1400s, 1400s}, {1600s, 1600s}, {99999s, 1600s}, {-1s, 1300s}};
-    for (const auto& c : cases) EXPECT_EQ(firstDue(repeating, 1000s, c.kept), c.due);
+    const std::pair<std::optional<Duration>, Duration> cases[]{{std::nullopt, 1300s}, {900s, 1300s},   {1400s, 1400s},
+                                                               {1600s, 1600s},        {99999s, 1600s}, {-1s, 1300s}};
+    for (const auto& [kept, due] : cases) EXPECT_EQ(firstDue(repeating, 1000s, kept), due);
     EXPECT_EQ(firstDue({.delay = 1s, .interval = 600s}, 1000s, 1500s), 1001s) << "no interval is kept to";
 }
 
 TEST(DeviceUseTest, PowerSuppliesSayWhatTheDeviceRunsOn)
 {
-    const struct {
-        std::map<std::string, std::map<std::string, std::string>> supplies;
-        bool onBattery;
-    } cases[]{
+    const std::pair<std::map<std::string, std::map<std::string, std::string>>, bool> cases[]{
         {{}, false},
         {{{"BAT0", {{"type", "Battery\n"}, {"present", "1\n"}}}}, true},
         {{{"BAT0", {{"type", "Battery\n"}}}, {"AC", {{"type", "Mains\n"}, {"online", "0\n"}}}}, true},
@@ -84,25 +71,21 @@ TEST(DeviceUseTest, PowerSuppliesSayWhatTheDeviceRunsOn)
         {{{"hidpp", {{"type", "Battery\n"}, {"scope", "Device\n"}}}}, false},
         {{{"odd", {}}}, false},
     };
-    for (const auto& c : cases) {
+    for (const auto& [supplies, onBattery] : cases) {
         const test::TemporaryDirectory root;
-        for (const auto& [name, lines] : c.supplies) {
+        for (const auto& [name, lines] : supplies) {
             std::filesystem::create_directory(root / name);
             for (const auto& [file, line] : lines) test::writeFile(root / name / file, line);
         }
-        EXPECT_EQ(isOnBattery(root.path), c.onBattery);
+        EXPECT_EQ(isOnBattery(root.path), onBattery);
     }
     EXPECT_FALSE(isOnBattery("/nowhere"));
 }
 
 // ---- the scheduler ----
 
-struct ActivitySchedulerTest : testing::Test {
-    ActivitySchedulerTest()
-    {
-        Log::threshold = LogLevel::Fault;
-        start();
-    }
+struct ActivitySchedulerTest : testing::Test, test::ByHand {
+    ActivitySchedulerTest() { start(); }
     ~ActivitySchedulerTest() override { kill(); }
 
     void start()
@@ -115,10 +98,6 @@ struct ActivitySchedulerTest : testing::Test {
         held.clear();
         scheduler.reset();
         executor.drain();
-    }
-    void advance(Duration by)
-    {
-        clock.advance(by, [this] { executor.drain(); });
     }
     [[nodiscard]] std::int64_t seconds() const
     {
@@ -137,8 +116,6 @@ struct ActivitySchedulerTest : testing::Test {
     }
     std::vector<std::string> taken() { return std::exchange(runs, {}); }
 
-    test::ManualClock clock;
-    test::ManualExecutor executor;
     test::MemoryFiles files;
     test::FakeDeviceUse use{executor};
     std::unique_ptr<ActivityScheduler> scheduler;

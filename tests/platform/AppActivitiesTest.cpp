@@ -83,9 +83,7 @@ TEST_F(AppActivitiesTest, KeepEveryFieldAndTheirAbsence)
     EXPECT_EQ(read[1].contentUrl, "");
     EXPECT_FALSE(read[1].publiclyIndexable);
 
-    struct stat status{};
-    ASSERT_EQ(stat(file.c_str(), &status), 0);
-    EXPECT_EQ(status.st_mode & 0777, 0600u);
+    EXPECT_EQ(test::modeOf(file), 0600u);
 }
 
 TEST_F(AppActivitiesTest, AreForgottenAfterSevenDaysAndNotTakenLater)
@@ -126,10 +124,7 @@ TEST_F(AppActivitiesTest, WhatIsNoDatabaseIsAnErrorAndStaysAsItIs)
 TEST_F(AppActivitiesTest, ADatabaseOfAnotherMakeIsAnErrorWhateverItHolds)
 {
     add(activity("a", 0s));
-    const struct {
-        const char* statements;
-        bool readable;
-    } cases[]{
+    const std::pair<const char*, bool> cases[]{
         {"UPDATE app_activity SET start = 'today', app = x'00ff', publicly_indexable = 'yes'", true},
         {"ALTER TABLE app_activity ADD COLUMN other", true},
         {"INSERT INTO app_activity (app, start) VALUES (hex(zeroblob(1000000)), unixepoch('2026-01-01'))", false},

@@ -47,10 +47,7 @@ TEST(BackgroundPolicy, OnlyWhatMayGetBetterIsTriedAgain)
 TEST(BackgroundPolicy, RetryAfterIsSecondsOrADate)
 {
     const Date now = dateFromSecondsSince1970(784111777); // Sun, 06 Nov 1994 08:49:37 GMT
-    const struct {
-        std::string_view field;
-        std::optional<Duration> wait;
-    } cases[]{
+    const std::pair<std::string_view, std::optional<Duration>> cases[]{
         {"0", 0s},
         {"120", 120s},
         {"86400", 24h},
@@ -66,7 +63,7 @@ TEST(BackgroundPolicy, RetryAfterIsSecondsOrADate)
         {"soon", std::nullopt},
         {std::string_view("Sun, 06 Nov 1994 08:59:37 GMT                                            x"), std::nullopt},
     };
-    for (const auto& c : cases) EXPECT_EQ(retryAfter(c.field, now), c.wait) << c.field;
+    for (const auto& [field, wait] : cases) EXPECT_EQ(retryAfter(field, now), wait) << field;
 }
 
 TEST(LivedTime, CountsAbsenceAndSuspendButNoLeaps)

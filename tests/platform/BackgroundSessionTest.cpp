@@ -1,9 +1,7 @@
 #include "platform/net/BackgroundSession.h"
 
-#include <csignal>
+#include <algorithm>
 #include <fcntl.h>
-#include <sys/resource.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <fmt/format.h>
@@ -13,11 +11,11 @@
 #include "platform/files/Sqlite.h"
 #include "platform/net/NetworkStatus.h"
 #include "platform/values/Json.h"
+#include "tests/support/ByHand.h"
 #include "tests/support/FakeUrlLoader.h"
-#include "tests/support/ManualClock.h"
-#include "tests/support/ManualExecutor.h"
+#include "tests/support/FullDisk.h"
+#include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"
-#include "tests/support/TestDevice.h"
 
 namespace platform {
 namespace {
@@ -26,18 +24,9 @@ using namespace std::chrono_literals;
 using test::FakeUrlLoader;
 namespace fs = std::filesystem;
 
-std::string contentsOf(int fd)
+std::string contentsOf(const FileHandle& file)
 {
-    std::string text(1u << 20, '\0');
-    const ssize_t count = pread(fd, text.data(), text.size(), 0);
-    text.resize(static_cast<std::size_t>(std::max<ssize_t>(count, 0)));
-    return text;
-}
-
-std::string contentsOf(const fs::path& path)
-{
-    const FileHandle file(open(path.c_str(), O_RDONLY));
-    return file ? contentsOf(file.fd()) : "(none)";
+    return std::string(readFile(file, 1u << 20).value_or(Bytes("(none)")).view());
 }
 
 /// Writes down what it is told, a line each.
@@ -46,7 +35,8 @@ struct Recorder final : BackgroundSessionDelegate {
     void taskDidFinishDownloading(const std::shared_ptr<BackgroundTask>& task, const fs::path& file,
                                   const UrlResponse&) override
     {
-        told.push_back(fmt::format("{} file {}", task->identifier(), contentsOf(file)));
+        told.push_back(
+            fmt::format("{} file {}", task->identifier(), contentsOf(FileHandle(open(file.c_str(), O_RDONLY)))));
     }
     void taskDidComplete(const std::shared_ptr<BackgroundTask>& task, const std::optional<UrlResponse>& response,
                          const std::optional<Error>& error) override
@@ -59,25 +49,25 @@ struct Recorder final : BackgroundSessionDelegate {
 };
 
 /// A process with one background session on a directory; its loads are answered by hand.
-struct Process {
+struct Process : test::ByHand {
     explicit Process(const fs::path& root_, BackgroundSessionConfiguration configuration = {.identifier = "uploads"},
                      test::ManualClock* clock_ = nullptr)
-        : root(root_), clock(clock_ ? *clock_ : ownClock)
+        : root(root_), time(clock_ ? *clock_ : clock)
     {
         network.set({});
         session = sessions->make(std::move(configuration), delegate, queue);
-        executor.drain();
+        drain();
     }
     ~Process()
     {
         session.reset();
-        executor.drain();
+        drain();
         loader.cancelAll();
-        executor.drain();
+        drain();
     }
     void advance(Duration by)
     {
-        clock.advance(by, [this] { executor.drain(); });
+        time.advance(by, [this] { drain(); });
     }
     std::shared_ptr<BackgroundTask> upload(std::string_view body, const std::string& url = "https://a.example/up")
     {
@@ -91,13 +81,13 @@ struct Process {
     {
         auto task = upload(body, url);
         task->resume();
-        executor.drain();
+        drain();
         return task;
     }
     /// The attempts that are under way.
     std::vector<std::shared_ptr<FakeUrlLoader::Task>> attempts()
     {
-        executor.drain();
+        drain();
         std::vector<std::shared_ptr<FakeUrlLoader::Task>> running;
         for (const auto& task : loader.sessions.at(0)->tasks)
             if (!task->finished) running.push_back(task);
@@ -106,12 +96,12 @@ struct Process {
     void answer(int status, HttpHeaders headers = {})
     {
         attempts().at(0)->respond(status, "", std::move(headers));
-        executor.drain();
+        drain();
     }
     void fail(std::int64_t code, std::string_view domain = kUrlErrorDomain)
     {
         attempts().at(0)->fail(Error(std::string(domain), code));
-        executor.drain();
+        drain();
     }
     /// Answers attempts, also those made later, until there are none.
     void answerAll(int status)
@@ -124,18 +114,16 @@ struct Process {
     std::vector<std::string> told() { return std::exchange(delegate->told, {}); }
 
     fs::path root;
-    test::ManualClock ownClock;
-    test::ManualClock& clock;
-    test::ManualExecutor executor;
+    test::ManualClock& time; ///< its own, or one that outlives it
     FakeUrlLoader loader;
     NetworkStatus network;
-    std::shared_ptr<Queue> queue = Queue::make("delegate", Queue::Kind::Serial, executor, clock);
+    std::shared_ptr<Queue> queue = makeQueue("delegate");
     std::shared_ptr<Recorder> delegate = std::make_shared<Recorder>();
     std::unique_ptr<FileSystem> files = makeSystemFiles();
     std::unique_ptr<BackgroundSessions> sessions = makeBackgroundSessions({.files = *files,
                                                                            .loader = loader,
                                                                            .network = network,
-                                                                           .clock = clock,
+                                                                           .clock = time,
                                                                            .executor = executor,
                                                                            .directory = root / "transfers",
                                                                            .temporary = root});
@@ -143,8 +131,12 @@ struct Process {
 };
 
 struct BackgroundSessionTest : testing::Test {
-    BackgroundSessionTest() { Log::threshold = LogLevel::Fault; } // what is expected is captured, not printed
     [[nodiscard]] fs::path store() const { return root.path / "transfers" / "uploads"; }
+    [[nodiscard]] std::ptrdiff_t bodies() const
+    {
+        return std::ranges::count_if(fs::directory_iterator(store()),
+                                     [](const auto& entry) { return entry.path().extension() == ".body"; });
+    }
     test::TemporaryDirectory root;
     using Told = std::vector<std::string>;
 };
@@ -161,18 +153,16 @@ TEST_F(BackgroundSessionTest, AnUploadHasItsOwnCopyAndEndsOnce)
     task->resume();
     task->resume();
     ASSERT_EQ(process.attempts().size(), 1u);
-    EXPECT_EQ(contentsOf(process.attempts()[0]->files.upload.fd()), "the body");
-    struct stat status{};
-    ASSERT_EQ(stat(store().c_str(), &status), 0);
-    EXPECT_EQ(status.st_mode & 0777, 0700u);
-    for (const auto& entry : fs::directory_iterator(store())) {
-        ASSERT_EQ(stat(entry.path().c_str(), &status), 0);
-        EXPECT_EQ(status.st_mode & 0777, 0600u) << entry.path();
-    }
+    EXPECT_EQ(contentsOf(process.attempts()[0]->files.upload), "the body");
+    EXPECT_EQ(test::modeOf(store()), 0700u);
+    for (const auto& entry : fs::directory_iterator(store()))
+        EXPECT_EQ(test::modeOf(entry.path()), 0600u) << entry.path();
+    process.attempts()[0]->timing = "timing";
     process.answer(500);
     EXPECT_EQ(process.told(), (Told{"1 500 0 note {\"count\":3}", "all"})) << "any status ends a task";
+    EXPECT_EQ(task->timingData(), Value("timing"));
     task->cancel();
-    process.executor.drain();
+    process.drain();
     EXPECT_TRUE(process.told().empty());
     EXPECT_FALSE(fs::exists(store() / "1.body"));
     life.reset();
@@ -189,7 +179,7 @@ TEST_F(BackgroundSessionTest, ADownloadIsHandedOverInAFileThatGoes)
     const auto attempt = process.attempts().at(0);
     ASSERT_EQ(pwrite(attempt->files.download.fd(), "resource", 8, 0), 8);
     attempt->respond(200, "");
-    process.executor.drain();
+    process.drain();
     EXPECT_EQ(process.told(), (Told{"1 file resource", "1 200 0 note null", "all"}));
     EXPECT_FALSE(fs::exists(store() / "1.download"));
 }
@@ -213,14 +203,14 @@ TEST_F(BackgroundSessionTest, AKillAtAnyMomentLosesAndDoublesNothing)
     kill(); // 1
     task->resume();
     kill(); // 2: resumed
-    process.executor.drain();
+    process.drain();
     kill(); // 3: under way
     process.fail(kUrlConnectionLost);
     kill(); // 4: waiting for its next attempt
     process.advance(1h);
     process.attempts().at(0)->respond(204, "");
     kill(); // 5: answered, unheard
-    process.executor.drain();
+    process.drain();
     kill(); // 6: over
 
     const struct {
@@ -230,8 +220,7 @@ TEST_F(BackgroundSessionTest, AKillAtAnyMomentLosesAndDoublesNothing)
         Process after(copyOf(n));
         after.advance(1h);
         EXPECT_EQ(after.attempts().size(), static_cast<std::size_t>(expected[n].attempts)) << n;
-        for (const auto& attempt : after.attempts())
-            EXPECT_EQ(contentsOf(attempt->files.upload.fd()), "whole body") << n;
+        for (const auto& attempt : after.attempts()) EXPECT_EQ(contentsOf(attempt->files.upload), "whole body") << n;
         after.answerAll(200);
         EXPECT_EQ(after.told(), expected[n].completions ? (Told{"1 200 0 note 7", "all"}) : Told{}) << n;
         EXPECT_FALSE(fs::exists(copyOf(n) / "transfers/uploads/1.body")) << n;
@@ -257,7 +246,7 @@ TEST_F(BackgroundSessionTest, ADownloadWhoseFileWasTakenIsMadeAgain)
         Process process(root.path);
         auto task = process.session->downloadTask({.url = *Url::parse("https://a.example/r")});
         (*task)->resume();
-        process.executor.drain();
+        process.drain();
         process.delegate.reset();
         process.answer(200);
     }
@@ -286,18 +275,14 @@ TEST_F(BackgroundSessionTest, WhatAKillLeftBehindIsSwept)
 TEST_F(BackgroundSessionTest, ADamagedStoreIsBegunAnew)
 {
     const test::LogCapture log;
-    const auto damage = [&](std::size_t offset, std::string_view bytes) {
+    const auto damage = [&](off_t offset, std::string_view bytes) {
         const FileHandle file(open((store() / "transfers.db").c_str(), O_WRONLY));
-        EXPECT_EQ(pwrite(file.fd(), bytes.data(), bytes.size(), static_cast<off_t>(offset)),
-                  static_cast<ssize_t>(bytes.size()));
+        EXPECT_EQ(pwrite(file.fd(), bytes.data(), bytes.size(), offset), std::ssize(bytes));
     };
     const auto alter = [&](const char* statement) {
         ASSERT_TRUE(Sqlite::open(store() / "transfers.db", Sqlite::Access::Exclusive)->execute(statement));
     };
-    const struct {
-        const char* name;
-        std::function<void()> hurt;
-    } cases[]{
+    const std::pair<const char*, std::function<void()>> cases[]{
         {"no database", [&] { damage(0, "this is not a database"); }},
         {"broken page", [&] { damage(4096, std::string(4096, '\xff')); }},
         {"another shape", [&] { alter("ALTER TABLE task ADD COLUMN other TEXT"); }},
@@ -305,19 +290,19 @@ TEST_F(BackgroundSessionTest, ADamagedStoreIsBegunAnew)
         {"empty", [&] { fs::resize_file(store() / "transfers.db", 0); }},
         {"cut", [&] { fs::resize_file(store() / "transfers.db", 5000); }},
     };
-    for (const auto& c : cases) {
+    for (const auto& [name, hurt] : cases) {
         fs::remove_all(store());
         {
             (void)Process(root.path).resumed("x");
         }
-        c.hurt();
+        hurt();
         Process next(root.path);
-        EXPECT_TRUE(next.attempts().empty()) << c.name;
-        EXPECT_TRUE(next.told().empty()) << c.name << ": not invalid";
-        EXPECT_FALSE(fs::exists(store() / "1.body")) << c.name;
+        EXPECT_TRUE(next.attempts().empty()) << name;
+        EXPECT_TRUE(next.told().empty()) << name << ": not invalid";
+        EXPECT_FALSE(fs::exists(store() / "1.body")) << name;
         (void)next.resumed("y");
         next.answer(200);
-        EXPECT_EQ(next.told().size(), 2u) << c.name;
+        EXPECT_EQ(next.told().size(), 2u) << name;
     }
     EXPECT_EQ(log.count("are damaged and begun anew"), 5) << "an empty file is a new store";
 }
@@ -325,45 +310,32 @@ TEST_F(BackgroundSessionTest, ADamagedStoreIsBegunAnew)
 TEST_F(BackgroundSessionTest, WhereTheStoreCantBeUsedTasksWorkAndEndWithTheProcess)
 {
     fs::create_directory(root / "elsewhere");
-    const struct {
-        const char* name;
-        std::function<std::shared_ptr<void>()> spoil;
-    } cases[]{
+    const std::pair<const char*, std::function<std::shared_ptr<void>()>> cases[]{
         {"another process", [&] { return std::make_shared<Process>(root.path); }},
-        {"a link",
-         [&]() -> std::shared_ptr<void> {
-             fs::create_directory(root / "transfers");
-             fs::create_directory_symlink(root / "elsewhere", store());
-             return nullptr;
-         }},
-        {"a file",
-         [&]() -> std::shared_ptr<void> {
-             fs::create_directory(root / "transfers");
-             test::writeFile(store(), "");
-             return nullptr;
-         }},
+        {"a link", [&] { return fs::create_directory_symlink(root / "elsewhere", store()), nullptr; }},
+        {"a file", [&] { return test::writeFile(store(), ""), nullptr; }},
         {"a link for the database",
-         [&]() -> std::shared_ptr<void> {
-             fs::create_directories(store());
-             fs::create_symlink(root / "elsewhere/db", store() / "transfers.db");
-             return nullptr;
+         [&] {
+             fs::create_directory(store());
+             return fs::create_symlink(root / "elsewhere/db", store() / "transfers.db"), nullptr;
          }},
     };
-    for (const auto& c : cases) {
+    for (const auto& [name, spoil] : cases) {
         fs::remove_all(root / "transfers");
-        const auto other = c.spoil();
+        fs::create_directory(root / "transfers");
+        const auto other = spoil();
         if (other) (void)std::static_pointer_cast<Process>(other)->resumed("the other's");
         {
             Process process(root.path);
             (void)process.resumed("mine");
-            ASSERT_EQ(process.attempts().size(), 1u) << c.name;
-            EXPECT_EQ(contentsOf(process.attempts()[0]->files.upload.fd()), "mine");
+            ASSERT_EQ(process.attempts().size(), 1u) << name;
+            EXPECT_EQ(contentsOf(process.attempts()[0]->files.upload), "mine");
             process.answer(200);
-            EXPECT_EQ(process.told(), (Told{"invalid POSIX", "1 200 0 note null", "all"})) << c.name;
+            EXPECT_EQ(process.told(), (Told{"invalid POSIX", "1 200 0 note null", "all"})) << name;
         }
-        EXPECT_TRUE(fs::is_empty(root / "elsewhere")) << c.name;
+        EXPECT_TRUE(fs::is_empty(root / "elsewhere")) << name;
         for (const auto& entry : fs::directory_iterator(root.path))
-            EXPECT_FALSE(entry.path().filename().string().starts_with("background")) << c.name;
+            EXPECT_FALSE(entry.path().filename().string().starts_with("background")) << name;
     }
 }
 
@@ -411,17 +383,14 @@ TEST_F(BackgroundSessionTest, ATaskThatCantBeKeptIsAnError)
     ASSERT_TRUE(second);
     EXPECT_EQ(make(fine, "").error().code, kUrlTooLarge) << "a third";
     second->reset();
-    process.executor.drain();
+    process.drain();
     EXPECT_TRUE(make(fine, "1")) << "one that was let go of has made room";
-    process.executor.drain();
-    std::size_t bodies = 0;
-    for (const auto& entry : fs::directory_iterator(store())) bodies += entry.path().extension() == ".body";
-    EXPECT_EQ(bodies, 1u) << "nothing is left of what wasn't made, and the last was let go of at once";
+    process.drain();
+    EXPECT_EQ(bodies(), 1u) << "nothing is left of what wasn't made, and the last was let go of at once";
     (*first)->setNote(std::string(200'000, 'n'));
     EXPECT_TRUE((*first)->note().isNull());
 }
 
-/// A limit on the size of files fails writes as a full disk does.
 TEST_F(BackgroundSessionTest, OnAFullDiskATaskIsAnErrorAndTheOthersGoOn)
 {
     Process process(root.path);
@@ -429,33 +398,21 @@ TEST_F(BackgroundSessionTest, OnAFullDiskATaskIsAnErrorAndTheOthersGoOn)
     test::writeFile(root / "large", std::string(300'000, 'x'));
     test::writeFile(root / "small", "small");
     const UrlRequest request{.url = *Url::parse("https://a.example/")};
-
-    std::signal(SIGXFSZ, SIG_IGN);
-    rlimit before{};
-    ASSERT_EQ(getrlimit(RLIMIT_FSIZE, &before), 0);
-    rlimit full = before;
-    full.rlim_cur = 200'000;
-    ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &full), 0);
-    const auto large = process.session->uploadTask(request, root / "large");
-    bool refused = false;
     std::vector<std::shared_ptr<BackgroundTask>> kept;
-    for (int i = 0; i < 100 && !refused; ++i) {
-        auto made = process.session->uploadTask(request, root / "small");
-        refused = !made;
-        if (made) kept.push_back(*made);
-    }
-    process.answer(200);
-    setrlimit(RLIMIT_FSIZE, &before);
-    std::signal(SIGXFSZ, SIG_DFL);
-
-    EXPECT_FALSE(large);
-    EXPECT_TRUE(refused) << "the database's own log is full";
+    test::onFullDisk(200'000, [&] {
+        EXPECT_FALSE(process.session->uploadTask(request, root / "large"));
+        while (kept.size() < 100) {
+            auto made = process.session->uploadTask(request, root / "small");
+            if (!made) break;
+            kept.push_back(*made);
+        }
+        process.answer(200);
+    });
+    EXPECT_LT(kept.size(), 100u) << "the database's own log is full";
     EXPECT_EQ(process.told(), (Told{"1 200 0 note null"}));
-    std::size_t bodies = 0;
-    for (const auto& entry : fs::directory_iterator(store())) bodies += entry.path().extension() == ".body";
-    EXPECT_LE(bodies, kept.size() + 1) << "nothing of those that weren't made";
+    EXPECT_LE(bodies(), kept.size() + 1) << "nothing of those that weren't made";
     EXPECT_TRUE(process.session->uploadTask(request, root / "large")) << "once there is room";
-    process.executor.drain();
+    process.drain();
     EXPECT_FALSE(fs::exists(store() / "1.body"));
 }
 
@@ -487,7 +444,7 @@ TEST_F(BackgroundSessionTest, TasksWaitForTheNetworkThatTheyMayUse)
     process.network.set(metered);
     EXPECT_TRUE(process.attempts().empty()) << "what is under way is broken off";
     process.network.set({});
-    process.executor.drain();
+    process.drain();
     process.network.set(offline);
     EXPECT_EQ(process.attempts().size(), 1u) << "the attempt finds out by itself";
     process.fail(kUrlCannotFindHost);
@@ -506,13 +463,13 @@ TEST_F(BackgroundSessionTest, FailedAttemptsAreMadeAgainUntilTheTimeIsUp)
             ++attempts;
             process.fail(kUrlConnectionLost);
         }
-        EXPECT_LE(process.clock.pendingTimers(), 1u);
+        EXPECT_LE(process.time.pendingTimers(), 1u);
         process.advance(1min);
     }
     EXPECT_GT(attempts, 24);
     EXPECT_LT(attempts, 60) << "the delays grow";
     EXPECT_EQ(process.told(), (Told{fmt::format("1 0 {} note null", std::int64_t{kUrlTimedOut}), "all"}));
-    EXPECT_EQ(process.clock.pendingTimers(), 0u);
+    EXPECT_EQ(process.time.pendingTimers(), 0u);
 }
 
 TEST_F(BackgroundSessionTest, WhatCantGetBetterEndsATask)
@@ -595,7 +552,7 @@ TEST_F(BackgroundSessionTest, SoManyAtOnceAndInTheirOrder)
     for (int i = 0; i < 5; ++i) tasks.push_back(process.resumed(std::to_string(i)));
     const auto running = process.attempts();
     ASSERT_EQ(running.size(), 2u);
-    EXPECT_EQ(contentsOf(running[0]->files.upload.fd()) + contentsOf(running[1]->files.upload.fd()), "01");
+    EXPECT_EQ(contentsOf(running[0]->files.upload) + contentsOf(running[1]->files.upload), "01");
     tasks[0]->cancel();
     tasks[3]->cancel();
     EXPECT_EQ(process.attempts().size(), 2u) << "the next takes the place";
@@ -606,35 +563,13 @@ TEST_F(BackgroundSessionTest, SoManyAtOnceAndInTheirOrder)
         onDelegateQueue = process.queue->isCurrent();
     });
     EXPECT_TRUE(listed.empty()) << "not inside the call";
-    process.executor.drain();
+    process.drain();
     EXPECT_FALSE(onDelegateQueue);
     EXPECT_EQ(listed, (std::vector{tasks[1], tasks[2], tasks[4]}));
     const auto cancelled = fmt::format(" 0 {} note null", std::int64_t{kUrlCancelled});
     EXPECT_EQ(process.told(), (Told{"1" + cancelled, "4" + cancelled}));
     process.answerAll(200);
     EXPECT_EQ(process.told().back(), "all");
-}
-
-TEST_F(BackgroundSessionTest, ManyTasksAreTakenUpAndDone)
-{
-    constexpr int kTasks = 1000;
-    const test::TemporaryDirectory quick("/dev/shm"); // as many syncs of a disk take a minute
-    {
-        Process process(quick.path, {.identifier = "uploads", .maximumTasks = kTasks});
-        process.network.set({.online = false});
-        for (int i = 0; i < kTasks; ++i) process.upload("body")->resume();
-        EXPECT_FALSE(process.session->downloadTask({.url = *Url::parse("https://a.example/")}));
-    }
-    Process next(quick.path, {.identifier = "uploads", .parallelTransfers = 8});
-    std::size_t done = 0;
-    while (!next.attempts().empty()) {
-        auto& tasks = next.loader.sessions.at(0)->tasks;
-        for (const auto& attempt : next.attempts()) attempt->respond(200, "");
-        next.executor.drain();
-        std::erase_if(tasks, [](const auto& task) { return task->finished; });
-    }
-    for (const auto& line : next.told()) done += line.ends_with("note null");
-    EXPECT_EQ(done, kTasks);
 }
 
 } // namespace

@@ -8,29 +8,19 @@
 #include "platform/values/Dictionary.h"
 #include "platform/values/Json.h"
 #include "platform/values/Value.h"
-#include "tests/support/ManualClock.h"
-#include "tests/support/ManualExecutor.h"
+#include "tests/support/ByHand.h"
+#include "tests/support/LogCapture.h"
 #include "tests/support/MemoryFiles.h"
-#include "tests/support/TestDevice.h"
 
 namespace platform {
 namespace {
 
 using namespace std::chrono_literals;
 
-struct CountersTest : testing::Test {
-    static void SetUpTestSuite() { Log::threshold = LogLevel::Fault; } // what is expected is captured, not printed
-
-    void advance(Duration by)
-    {
-        clock.advance(by, [this] { executor.drain(); });
-    }
-
+struct CountersTest : testing::Test, test::ByHand {
     const std::filesystem::path path = "/state/app/counters.json";
-    test::ManualClock clock;
-    test::ManualExecutor executor;
     test::MemoryFiles files;
-    std::shared_ptr<Queue> queue = Queue::make("test.counters", Queue::Kind::Serial, executor, clock);
+    std::shared_ptr<Queue> queue = makeQueue("test.counters");
     test::LogCapture log;
 };
 

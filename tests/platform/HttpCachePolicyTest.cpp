@@ -61,10 +61,7 @@ TEST(HttpCachePolicyTest, OnlyPlainRequestsHaveToDoWithACache)
 
 TEST(HttpCachePolicyTest, LifetimesComeFromTheBestSourceAndWrongOnesAreNone)
 {
-    const struct {
-        HttpHeaders headers;
-        std::int64_t lifetime;
-    } cases[]{
+    const std::pair<HttpHeaders, std::int64_t> cases[]{
         {{}, 0},
         {{{"Cache-Control", "max-age=60"}}, 60},
         {{{"Cache-Control", "public, Max-Age=\"60\" , must-revalidate"}}, 60},
@@ -90,10 +87,10 @@ TEST(HttpCachePolicyTest, LifetimesComeFromTheBestSourceAndWrongOnesAreNone)
         {{{"Expires", "Thursday, 01-Jan-26 01:00:00 GMT"}}, 3600},
         {{{"Expires", "Thu Jan  1 01:00:00 2026"}}, 3600},
     };
-    for (const auto& c : cases) {
+    for (const auto& [headers, lifetime] : cases) {
         std::string fields;
-        for (const auto& [name, value] : c.headers) fields += name + ": " + value + "; ";
-        EXPECT_EQ(freshnessLifetime(answer(c.headers), kNow).count(), c.lifetime) << fields;
+        for (const auto& [name, value] : headers) fields += name + ": " + value + "; ";
+        EXPECT_EQ(freshnessLifetime(answer(headers), kNow).count(), lifetime) << fields;
     }
     EXPECT_EQ(freshnessLifetime(answer({{"Last-Modified", kTenDaysAgo}}, 500), kNow).count(), 0);
 }

@@ -1,22 +1,18 @@
 #include "platform/net/HttpCache.h"
 
-#include <algorithm>
-#include <csignal>
 #include <fcntl.h>
 #include <fstream>
-#include <sys/resource.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <fmt/format.h>
 #include <gtest/gtest.h>
 
-#include "platform/base/Log.h"
 #include "platform/files/Files.h"
 #include "platform/net/HttpCacheStore.h"
 #include "platform/run/Queue.h"
-#include "tests/support/ManualClock.h"
-#include "tests/support/ManualExecutor.h"
+#include "tests/support/ByHand.h"
+#include "tests/support/FullDisk.h"
+#include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace platform {
@@ -31,12 +27,12 @@ Url url(int number)
 }
 
 /// A cache in a directory, whose queue runs when the test says so, or when it is waited for.
-struct HttpCacheTest : testing::Test {
+struct HttpCacheTest : testing::Test, test::ByHand {
     const std::unique_ptr<FileSystem> files = makeSystemFiles();
     ~HttpCacheTest() override
     {
         cache.reset();
-        executor.drain(); // what waits keeps the cache
+        drain(); // what waits keeps the cache
     }
     void open(std::size_t memory = 0, std::uint64_t disk = 1u << 20)
     {
@@ -59,34 +55,20 @@ struct HttpCacheTest : testing::Test {
         const auto found = cache->find(url(number));
         return found ? std::string(found->body.view()) : "(none)";
     }
-    [[nodiscard]] std::size_t bodyFiles() const
+    /// The files of bodies; or all but the lock.
+    [[nodiscard]] std::vector<fs::path> cacheFiles(bool bodiesOnly) const
     {
-        std::size_t count = 0;
+        std::vector<fs::path> found;
         for (const auto& entry : fs::directory_iterator(directory / "http"))
-            count += entry.path().extension() == ".body" ? 1 : 0;
-        return count;
+            if (bodiesOnly ? entry.path().extension() == ".body" : entry.path().filename() != "lock")
+                found.push_back(entry.path());
+        return found;
     }
-    [[nodiscard]] fs::path onlyBodyFile() const
-    {
-        for (const auto& entry : fs::directory_iterator(directory / "http"))
-            if (entry.path().extension() == ".body") return entry.path();
-        return {};
-    }
-    /// Every file of the directory but the lock.
-    template <class Spoil> void spoilAll(Spoil spoil) const
-    {
-        std::vector<fs::path> files;
-        for (const auto& entry : fs::directory_iterator(directory / "http"))
-            if (entry.path().filename() != "lock") files.push_back(entry.path());
-        for (const fs::path& file : files) spoil(file);
-    }
+    [[nodiscard]] std::size_t bodyFiles() const { return cacheFiles(true).size(); }
 
     test::TemporaryDirectory directory;
-    test::ManualClock clock;
-    test::ManualExecutor executor;
-    std::shared_ptr<Queue> queue = Queue::make("test.httpCache", Queue::Kind::Serial, executor, clock);
-    std::vector<std::string> lines;
-    LogTap tap{[this](const LogLine& line) { lines.emplace_back(line.text); }};
+    std::shared_ptr<Queue> queue = makeQueue("test.httpCache");
+    test::LogCapture log;
     std::shared_ptr<HttpCache> cache;
 };
 
@@ -129,11 +111,8 @@ TEST_F(HttpCacheTest, AnswersAreFoundWholeAtOnceAndAfterARestart)
     EXPECT_EQ(find(1), "(none)");
     EXPECT_EQ(find(2), "replaced");
 
-    struct stat status{};
-    ASSERT_EQ(stat((directory / "http").c_str(), &status), 0);
-    EXPECT_EQ(status.st_mode & 0777, 0700u);
-    ASSERT_EQ(stat((directory / "http/index.db").c_str(), &status), 0);
-    EXPECT_EQ(status.st_mode & 0777, 0600u);
+    EXPECT_EQ(test::modeOf(directory / "http"), 0700u);
+    EXPECT_EQ(test::modeOf(directory / "http/index.db"), 0600u);
 }
 
 TEST_F(HttpCacheTest, MemoryAnswersWithoutTheDiskAndGivesUpWhatWasUsedLeast)
@@ -175,7 +154,7 @@ TEST_F(HttpCacheTest, UsesInMemoryCountOnDisk)
     for (int i = 0; i < 40; ++i) {
         store(i, kLarge);
         EXPECT_EQ(find(0), kLarge);
-        executor.drain();
+        drain();
     }
     open(0, 250'000);
     EXPECT_EQ(find(0), kLarge);
@@ -191,7 +170,7 @@ TEST_F(HttpCacheTest, LookUpsQueueBehindWhatIsBeingWrittenAndAskTheDiskOnlyWhere
     };
     lookUp(1);
     EXPECT_EQ(seen, "") << "nobody knows yet what is on the disk";
-    executor.drain();
+    drain();
     EXPECT_EQ(seen, "-");
     lookUp(1);
     EXPECT_EQ(seen, "--") << "it is known to be nowhere";
@@ -202,7 +181,7 @@ TEST_F(HttpCacheTest, LookUpsQueueBehindWhatIsBeingWrittenAndAskTheDiskOnlyWhere
     cache->remove(url(1));
     lookUp(1);
     EXPECT_EQ(seen, "--");
-    executor.drain();
+    drain();
     EXPECT_EQ(seen, "--onetwo-");
 
     open(1u << 20);
@@ -232,7 +211,7 @@ TEST_F(HttpCacheTest, WhatWasStoredIsThereWhereverItWaits)
     cache->remove(url(2));
     store(2, "too");
     store(3, "thr");
-    executor.drain();
+    drain();
     EXPECT_EQ(seen, "--newtoothr");
 }
 
@@ -265,7 +244,7 @@ TEST_F(HttpCacheTest, NothingOutdatedComesFromTheDiskIntoMemory)
     cache->lookUp(url(1), [&](auto found) { seen = found->body.view(); });
     store(1, "new");
     cache->remove(url(1));
-    executor.drain();
+    drain();
     EXPECT_EQ(seen, "old");
     EXPECT_EQ(find(1), "(none)");
 }
@@ -274,15 +253,15 @@ TEST_F(HttpCacheTest, ASecondProcessRunsWithoutTheDisk)
 {
     open();
     store(1, kLarge);
-    executor.drain();
+    drain();
     const auto first = std::exchange(cache, nullptr);
     open(1u << 20);
     EXPECT_EQ(find(1), "(none)");
     store(2, "in memory");
-    executor.drain();
+    drain();
     EXPECT_EQ(find(2), "in memory");
     EXPECT_TRUE(first->find(url(1)));
-    EXPECT_EQ(std::ranges::count_if(lines, [](const auto& line) { return line.contains("can't be used"); }), 1);
+    EXPECT_EQ(log.count("can't be used"), 1);
 }
 
 TEST_F(HttpCacheTest, DamageIsDroppedAndNeverAnswered)
@@ -319,7 +298,7 @@ TEST_F(HttpCacheTest, DamageIsDroppedAndNeverAnswered)
             store(2, kLarge);
             EXPECT_EQ(find(2), kLarge);
             if (!running) cache.reset();
-            spoilAll(c.spoil);
+            for (const fs::path& file : cacheFiles(false)) c.spoil(file);
             if (!running) open();
             for (const int number : {1, 2}) {
                 const std::string found = find(number);
@@ -327,7 +306,7 @@ TEST_F(HttpCacheTest, DamageIsDroppedAndNeverAnswered)
             }
             EXPECT_NE(find(2), kLarge) << "its file is spoilt, whatever the index says";
             store(3, "goes on");
-            executor.drain();
+            drain();
             cache.reset();
             fs::remove_all(directory / "http");
         }
@@ -356,7 +335,7 @@ TEST_F(HttpCacheTest, SoManyMappingsAreKeptOnly)
     }
     EXPECT_EQ(mapped(), 3) << "more would be too large";
     cache.reset();
-    executor.drain();
+    drain();
     EXPECT_EQ(mapped(), 0);
 }
 
@@ -364,10 +343,10 @@ TEST_F(HttpCacheTest, OneDamagedBodyCostsNoOther)
 {
     open();
     store(1, kLarge);
-    executor.drain();
-    const fs::path spoilt = onlyBodyFile();
+    drain();
+    const fs::path spoilt = cacheFiles(true).at(0);
     store(2, kLarge);
-    executor.drain();
+    drain();
     {
         const FileHandle file(::open(spoilt.c_str(), O_WRONLY));
         ASSERT_EQ(pwrite(file.fd(), "x", 1, 12'345), 1);
@@ -375,7 +354,7 @@ TEST_F(HttpCacheTest, OneDamagedBodyCostsNoOther)
     EXPECT_EQ(find(1), "(none)");
     EXPECT_FALSE(fs::exists(spoilt));
     EXPECT_EQ(find(2), kLarge);
-    EXPECT_TRUE(std::ranges::any_of(lines, [](const auto& line) { return line.contains("damaged"); }));
+    EXPECT_EQ(log.count("damaged"), 1);
 
     test::writeFile(directory / "http/99.body", "of nobody");
     test::writeFile(directory / "http/7.body.1a2b3c4d.tmp", "half-writ");
@@ -389,7 +368,7 @@ TEST_F(HttpCacheTest, ADirectoryThatWasTakenAwayIsMadeAnew)
 {
     open();
     store(1, kLarge);
-    executor.drain();
+    drain();
     fs::remove_all(directory / "http");
     EXPECT_EQ(find(1), "(none)");
     store(2, kLarge);
@@ -418,26 +397,18 @@ TEST_F(HttpCacheTest, AFullDiskKeepsWhatIsThere)
     open();
     store(1, kLarge);
     store(2, kSmall);
-    executor.drain();
-    // The process may write no file beyond the index's size: the next large body fails as on a full disk.
-    rlimit before{};
-    ASSERT_EQ(getrlimit(RLIMIT_FSIZE, &before), 0);
-    const auto oldHandler = signal(SIGXFSZ, SIG_IGN);
-    rlimit limit = before;
-    limit.rlim_cur = 10'000;
-    ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &limit), 0);
-    store(1, std::string(30'000, 'n'));
-    store(3, kLarge);
-    executor.drain();
-    ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &before), 0);
-    signal(SIGXFSZ, oldHandler);
-
+    drain();
+    test::onFullDisk(10'000, [&] {
+        store(1, std::string(30'000, 'n'));
+        store(3, kLarge);
+        drain();
+    });
     EXPECT_NE(find(1), kLarge) << "an answer that was replaced is no longer true";
     EXPECT_EQ(find(3), "(none)");
     EXPECT_EQ(find(2), kSmall);
     store(3, kLarge);
     EXPECT_EQ(find(3), kLarge);
-    EXPECT_TRUE(std::ranges::any_of(lines, [](const auto& line) { return line.contains("can't be used"); }));
+    EXPECT_GT(log.count("can't be used"), 0);
 }
 
 /// Makes root somebody to whom directories may be read-only.
@@ -460,7 +431,7 @@ TEST_F(HttpCacheTest, AReadOnlyDirectoryIsReadAndNothingElse)
     open();
     store(1, kLarge);
     store(2, kLarge);
-    executor.drain();
+    drain();
     fs::permissions(directory / "http", fs::perms::owner_read | fs::perms::owner_exec);
     EXPECT_EQ(find(1), kLarge);
     store(2, std::string(30'000, 'n'));
@@ -468,7 +439,7 @@ TEST_F(HttpCacheTest, AReadOnlyDirectoryIsReadAndNothingElse)
     EXPECT_NE(find(2), kLarge) << "an answer that was replaced is no longer true";
     EXPECT_EQ(find(3), "(none)");
     EXPECT_EQ(find(1), kLarge);
-    EXPECT_EQ(std::ranges::count_if(lines, [](const auto& line) { return line.contains("can't be used"); }), 1);
+    EXPECT_EQ(log.count("can't be used"), 1);
 
     open();
     for (const int number : {1, 3}) {
@@ -487,12 +458,7 @@ TEST_F(HttpCacheTest, AReadOnlyDirectoryIsReadAndNothingElse)
 TEST_F(HttpCacheTest, AnIndexOfOtherTablesIsBegunAnew)
 {
     fs::create_directories(directory / "http");
-    {
-        auto index = Sqlite::open(directory / "http/index.db");
-        ASSERT_TRUE(index);
-        ASSERT_TRUE(
-            index->execute("CREATE TABLE entry (id INTEGER PRIMARY KEY, key TEXT); INSERT INTO entry VALUES (1, 'x')"));
-    }
+    ASSERT_TRUE(Sqlite::open(directory / "http/index.db")->execute("CREATE TABLE entry (id INTEGER, key TEXT)"));
     open();
     EXPECT_EQ(find(1), "(none)");
     store(1, kSmall);

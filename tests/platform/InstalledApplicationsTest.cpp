@@ -2,11 +2,9 @@
 
 #include <gtest/gtest.h>
 
-#include "platform/base/Log.h"
 #include "platform/files/Files.h"
 #include "platform/run/RunLoop.h"
-#include "tests/support/ManualClock.h"
-#include "tests/support/ManualExecutor.h"
+#include "tests/support/ByHand.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace platform {
@@ -19,10 +17,7 @@ constexpr const char* kEntry = "[Desktop Entry]\nType=Application\nName=App\nVer
 
 TEST(DesktopEntry, TellsWhetherItIsAnApplicationThatCanBeStarted)
 {
-    const struct {
-        const char* text;
-        bool installed;
-    } cases[]{
+    const std::pair<const char*, bool> cases[]{
         {kEntry, true},
         {"# made by hand\r\n[Desktop Entry]\r\nType = Application\r\nHidden=false\r\n", true},
         {"[Desktop Entry]\nType=Application\nNoDisplay=true\n", true},
@@ -36,18 +31,15 @@ TEST(DesktopEntry, TellsWhetherItIsAnApplicationThatCanBeStarted)
         {"", false},
         {"[Desktop Entry]\n=\n\0=\nType", false},
     };
-    for (const auto& c : cases)
-        EXPECT_EQ(isInstalledApplication(c.text, [](const std::string& program) { return program == "there"; }),
-                  c.installed)
-            << c.text;
+    for (const auto& [text, installed] : cases)
+        EXPECT_EQ(isInstalledApplication(text, [](const std::string& program) { return program == "there"; }),
+                  installed)
+            << text;
 }
 
 TEST(AppMetadata, TheFirstReleaseHasTheVersion)
 {
-    const struct {
-        std::string text;
-        std::optional<std::string> version;
-    } cases[]{
+    const std::pair<std::string, std::optional<std::string>> cases[]{
         {R"(<?xml version="1.0"?><component><id>a</id><releases><release date="2026-01-01" version="2.1"/>
             <release version="2.0"/></releases></component>)",
          "2.1"},
@@ -59,7 +51,7 @@ TEST(AppMetadata, TheFirstReleaseHasTheVersion)
         {R"(<!DOCTYPE c [<!ENTITY v SYSTEM "file:///etc/passwd">]><c>&v;<release version="1"/></c>)", "1"},
         {R"(<component><release version="&undefined;"/></component>)", {}},
     };
-    for (const auto& c : cases) EXPECT_EQ(firstReleaseVersion(c.text), c.version) << c.text;
+    for (const auto& [text, version] : cases) EXPECT_EQ(firstReleaseVersion(text), version) << text;
 
     std::string bomb = "<!DOCTYPE c [<!ENTITY e0 \"aaaaaaaaaaaaaaaa\">";
     for (int i = 1; i < 30; ++i) {
@@ -69,9 +61,7 @@ TEST(AppMetadata, TheFirstReleaseHasTheVersion)
     EXPECT_FALSE(firstReleaseVersion(bomb + "]><c>&e29;<release version=\"1\"/></c>"));
 }
 
-struct InstalledApplicationsTest : testing::Test {
-    static void SetUpTestSuite() { Log::threshold = LogLevel::Fault; }
-
+struct InstalledApplicationsTest : testing::Test, test::ByHand {
     std::unique_ptr<InstalledApplications> make()
     {
         return makeInstalledApplications(*files, {home.path, system.path, missing}, loop, executor, clock);
@@ -86,8 +76,6 @@ struct InstalledApplicationsTest : testing::Test {
     fs::path missing = home / "no/such/directory";
     std::unique_ptr<FileSystem> files = makeSystemFiles();
     RunLoop loop;
-    test::ManualExecutor executor; // the worker
-    test::ManualClock clock;
 };
 
 TEST_F(InstalledApplicationsTest, TheFirstDirectoryWinsAndBrokenEntriesAreLeftOut)

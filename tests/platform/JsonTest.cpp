@@ -18,10 +18,7 @@ std::string arrays(std::size_t depth)
 
 TEST(Json, ReadsEdgeCasesExactly)
 {
-    struct {
-        std::string_view text;
-        Value expected;
-    } const cases[] = {
+    const std::pair<std::string_view, Value> cases[]{
         {"\xef\xbb\xbf[1]", Value::Array{1}},
         {R"({"a":1,"b":2,"a":3})", Value::dictionaryOf({{"a", 3}, {"b", 2}})},
         {"-0", 0},
@@ -39,19 +36,16 @@ TEST(Json, ReadsEdgeCasesExactly)
         {"[]", Value::Array{}},
         {"{}", Dictionary{}},
     };
-    for (const auto& c : cases) {
-        const auto value = parseJson(c.text);
-        ASSERT_TRUE(value) << c.text << ": " << value.error().description();
-        EXPECT_EQ(*value, c.expected) << c.text;
+    for (const auto& [text, expected] : cases) {
+        const auto value = parseJson(text);
+        ASSERT_TRUE(value) << text << ": " << value.error().description();
+        EXPECT_EQ(*value, expected) << text;
     }
 }
 
 TEST(Json, ReadsWhatABrowserReads)
 {
-    struct {
-        std::string_view text;
-        Value expected;
-    } const cases[] = {
+    const std::pair<std::string_view, Value> cases[]{
         {R"("\ud800")", "\xef\xbf\xbd"},
         {R"("a\uDC00\ud83d\ude00\ud83d\ud83d\uDE00\ud800\u0041\ud800")",
          "a\xef\xbf\xbd\xf0\x9f\x98\x80\xef\xbf\xbd\xf0\x9f\x98\x80\xef\xbf\xbd"
@@ -63,10 +57,10 @@ TEST(Json, ReadsWhatABrowserReads)
                       UINT64_MAX, INT64_MIN, 7}},
         {"[18446744073709551616,-9223372036854775809]", Value::Array{18446744073709551616.0, -9223372036854775808.0}},
     };
-    for (const auto& c : cases) {
-        const auto value = parseJson(c.text);
-        ASSERT_TRUE(value) << c.text << ": " << value.error().description();
-        EXPECT_EQ(*value, c.expected) << c.text << " " << toJson(*value);
+    for (const auto& [text, expected] : cases) {
+        const auto value = parseJson(text);
+        ASSERT_TRUE(value) << text << ": " << value.error().description();
+        EXPECT_EQ(*value, expected) << text << " " << toJson(*value);
     }
     const std::string manyDigits = "[" + std::string(400, '9') + "]";
     EXPECT_EQ(parseJson(manyDigits).value()[0], Value(std::numeric_limits<double>::max()));
@@ -74,39 +68,19 @@ TEST(Json, ReadsWhatABrowserReads)
 
 TEST(Json, RefusesWhatIsNotJsonWithAReason)
 {
-    for (const std::string_view text : {"",
-                                        " ",
-                                        "\xef\xbb\xbf",
-                                        "nul",
-                                        "[1,]",
-                                        "{\"a\"}",
-                                        "{1:2}",
-                                        "[1] [2]",
-                                        "{}x",
-                                        "[1",
-                                        "\"a",
-                                        "\"\n\"",
-                                        "\"\xff\"",
-                                        "\"\xed\xa0\x80\"",
-                                        "\"\xc0\x80\"",
-                                        "01",
-                                        "+1",
-                                        ".5",
-                                        "NaN",
-                                        "[01, 1e400]",
-                                        "[+1, 1e400]",
-                                        "[1e400",
-                                        "[1e400 1]",
-                                        "1e400e1",
-                                        R"("\ud8")",
-                                        R"("\ud800\x")",
-                                        R"("\ud800)",
-                                        "\xff\xfe[\0]\0"}) {
-        const auto value = parseJson(text);
-        ASSERT_FALSE(value) << text;
-        EXPECT_EQ(value.error().code, kFormatMalformed) << text;
-        EXPECT_NE(value.error().reason(), "") << text;
-    }
+    const auto expectRefused = [](std::initializer_list<std::string_view> texts) {
+        for (const std::string_view text : texts) {
+            const auto value = parseJson(text);
+            ASSERT_FALSE(value) << text;
+            EXPECT_EQ(value.error().code, kFormatMalformed) << text;
+            EXPECT_NE(value.error().reason(), "") << text;
+        }
+    };
+    expectRefused({"", " ", "\xef\xbb\xbf", "nul", "\xff\xfe["});
+    expectRefused({"[1,]", "{\"a\"}", "{1:2}", "[1] [2]", "{}x", "[1", "[1e400", "[1e400 1]"});
+    expectRefused({"01", "+1", ".5", "NaN", "[01, 1e400]", "[+1, 1e400]", "1e400e1"});
+    expectRefused({"\"a", "\"\n\"", "\"\xff\"", "\"\xed\xa0\x80\"", "\"\xc0\x80\""});
+    expectRefused({R"("\ud8")", R"("\ud800\x")", R"("\ud800)"});
 }
 
 TEST(Json, BoundsDepthAndSize)
@@ -191,10 +165,7 @@ TEST(Json, KeepsNothingOfALargeDocumentForTheNextOne)
 
 TEST(Json, WritesEveryKindAsDocumented)
 {
-    struct {
-        Value value;
-        std::string_view expected;
-    } const cases[] = {
+    const std::pair<Value, std::string_view> cases[]{
         {nullptr, "null"},
         {true, "true"},
         {INT64_MIN, "-9223372036854775808"},
@@ -211,18 +182,17 @@ TEST(Json, WritesEveryKindAsDocumented)
          "\"a\xef\xbf\xbd\xef\xbf\xbd\xef\xbf\xbd\xef\xbf\xbdz\xef\xbf\xbd\xef\xbf\xbd\""},
         {Value::dictionaryOf({{"z", Value::Array{1, nullptr}}, {"a", Dictionary()}}), R"({"z":[1,null],"a":{}})"},
     };
-    for (const auto& c : cases) {
-        EXPECT_EQ(toJson(c.value), c.expected);
-        EXPECT_EQ(jsonSize(c.value), c.expected.size());
+    for (const auto& [value, expected] : cases) {
+        EXPECT_EQ(toJson(value), expected);
+        EXPECT_EQ(jsonSize(value), expected.size());
     }
-    EXPECT_EQ(toJson(cases[std::size(cases) - 1].value, JsonStyle::Pretty),
+    EXPECT_EQ(toJson(cases[std::size(cases) - 1].first, JsonStyle::Pretty),
               "{\n  \"z\": [\n    1,\n    null\n  ],\n  \"a\": {}\n}");
 }
 
 TEST(Json, BytesLongerThanOneChunkStayOneBase64Text)
 {
-    const std::string json = toJson(Bytes(std::string(10'000, '\0')));
-    EXPECT_EQ(json, '"' + std::string(13'334, 'A') + "==\"");
+    EXPECT_EQ(toJson(Bytes(std::string(10'000, '\0'))), '"' + std::string(13'334, 'A') + "==\"");
 }
 
 TEST(Json, DoublesSurviveTheRoundTrip)

@@ -2,7 +2,6 @@
 
 #include <cstdlib>
 #include <filesystem>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <gtest/gtest.h>
@@ -21,11 +20,8 @@ TEST(ListenSocket, TakesOverFromTheDeadOnly)
     {
         auto living = ListenSocket::bindExclusive(path);
         ASSERT_TRUE(living) << living.error().description();
-        struct stat status{};
-        stat(directory.c_str(), &status);
-        EXPECT_EQ(status.st_mode & 07777, 0700u);
-        stat(path.c_str(), &status);
-        EXPECT_EQ(status.st_mode & 07777, 0600u);
+        EXPECT_EQ(test::modeOf(directory), 0700u);
+        EXPECT_EQ(test::modeOf(path), 0600u);
         EXPECT_EQ(errorOf(), EADDRINUSE);
         std::filesystem::remove(directory / "socket.lock"); // as with a socket of the service manager
         EXPECT_EQ(errorOf(), EADDRINUSE);

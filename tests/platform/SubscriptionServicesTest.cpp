@@ -5,8 +5,9 @@
 #include "platform/files/Files.h"
 #include "platform/run/RunLoop.h"
 #include "platform/values/Json.h"
+#include "tests/support/LogCapture.h"
+#include "tests/support/ManualClock.h"
 #include "tests/support/TemporaryDirectory.h"
-#include "tests/support/TestDevice.h"
 
 namespace platform {
 namespace {

@@ -7,6 +7,7 @@
 #include <gtest/gtest.h>
 #include <systemd/sd-bus.h>
 
+#include "platform/base/Log.h"
 #include "platform/device/DeviceUse.h"
 #include "platform/device/DeviceUseLogind.h"
 #include "platform/device/LocationSource.h"
@@ -15,7 +16,6 @@
 #include "platform/net/NetworkStatusNetworkManager.h"
 #include "platform/run/RunLoop.h"
 #include "tests/support/TemporaryDirectory.h"
-#include "tests/support/TestDevice.h"
 
 namespace platform {
 namespace {

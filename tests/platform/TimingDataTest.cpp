@@ -96,11 +96,7 @@ std::vector<std::vector<std::string>> rowsOf(const std::string& page)
 TEST_F(TimingDataTest, ALoadThatFailedSaysHowFarItCame)
 {
     TestHttpServer server(always({"", Then::Close}));
-    Url closed;
-    {
-        const TestHttpServer gone(always({}));
-        closed = gone.url();
-    }
+    const Url closed = TestHttpServer(always({})).url();
     const struct {
         Url url;
         std::set<std::string> marks;

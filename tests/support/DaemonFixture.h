@@ -21,22 +21,10 @@ using platform::test::FakeConnection;
 /// Keeps what the daemon records, in order.
 class RecordingSessionManager final : public ClientSessionManager {
 public:
-    explicit RecordingSessionManager(Assembly& assembly)
-        : ClientSessionManager(assembly, assembly.guidController, "test")
-    {}
-    void addTavrinFeedback(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void>) override
-    {
-        records.push_back(std::move(feedback));
-    }
-
+    explicit RecordingSessionManager(Assembly& assembly);
+    void addTavrinFeedback(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void>) override;
     /// The classes of the records so far, taken out.
-    std::vector<std::string> takeClasses()
-    {
-        std::vector<std::string> classes;
-        for (const auto& record : records) classes.emplace_back(record->feedback()->className());
-        records.clear();
-        return classes;
-    }
+    std::vector<std::string> takeClasses();
     template <class T> std::shared_ptr<T> last() const
     {
         return records.empty() ? nullptr : std::dynamic_pointer_cast<T>(records.back()->feedback());
@@ -47,104 +35,34 @@ public:
 
 /// The whole daemon on a device of twins: the test is the clients, the service and the clock.
 struct DaemonTest : testing::Test {
-    ~DaemonTest() override
-    {
-        device.files.fault = {}; // it may refer to what the test had
-        settle();
-    }
+    DaemonTest();
+    ~DaemonTest() override;
 
     /// Lets everything under way end.
-    void settle()
-    {
-        const auto endLoads = [this] {
-            do device.drain();
-            while (device.loader.cancelAll());
-        };
-        endLoads();
-        device.ipc.endAll();
-        endLoads(); // what is recorded of a client's end may ask for a fresh bag
-    }
-
-    void start()
-    {
-        settle();
-        daemon.reset();
-        device.drain();
-        device.loader.sessions.clear();
-        daemon = startUp(device.device).value();
-        if (recordFeedback) {
-            session = std::make_shared<RecordingSessionManager>(assembly());
-            assembly().clientSessionManager = session;
-        }
-        device.drain();
-    }
-
+    void settle();
+    void start();
     /// Starts without a bag on disk, so that the first one must be fetched.
-    void startWithoutBag()
-    {
-        device.files.files.clear();
-        start();
-    }
+    void startWithoutBag();
 
     Assembly& assembly() { return daemon->assembly; }
 
     /// Requests of the foreground session, in order; the first is the bag's.
-    std::vector<std::shared_ptr<platform::test::FakeUrlLoader::Task>>& tasks()
-    {
-        return device.loader.sessions.at(0)->tasks;
-    }
+    std::vector<std::shared_ptr<platform::test::FakeUrlLoader::Task>>& tasks();
     auto lastTask() { return tasks().back(); }
-    void respond(std::string body, int status = 200, platform::HttpHeaders headers = {})
-    {
-        lastTask()->respond(status, std::move(body), std::move(headers));
-        device.drain();
-    }
+    void respond(std::string body, int status = 200, platform::HttpHeaders headers = {});
     /// Answers the bag request that is under way.
     void deliverBag(std::string body = kBag) { respond(std::move(body)); }
 
-    std::shared_ptr<FakeConnection> connect(pid_t pid = 77)
-    {
-        auto connection = device.ipc.connect("com.quorvane.TAVDaemonXPC", {.pid = pid, .uid = 0});
-        device.drain();
-        return connection;
-    }
+    std::shared_ptr<FakeConnection> connect(pid_t pid = 77);
     /// A client that has configured.
     std::shared_ptr<FakeConnection> client(std::string identifier = "com.quorvane.vistrel",
-                                           std::string agent = "Vistrel/4", pid_t pid = 77)
-    {
-        auto connection = connect(pid);
-        configure(*connection, std::move(identifier), std::move(agent));
-        return connection;
-    }
-    std::shared_ptr<FakeCall> configure(FakeConnection& connection, std::string identifier, std::string agent)
-    {
-        auto call = connection.call("Configure", {Value::dictionaryOf({{"class", "TAVSessionConfiguration"},
-                                                                       {"identifier", std::move(identifier)},
-                                                                       {"userAgent", std::move(agent)}})});
-        device.drain();
-        return call;
-    }
+                                           std::string agent = "Vistrel/4", pid_t pid = 77);
+    std::shared_ptr<FakeCall> configure(FakeConnection& connection, std::string identifier, std::string agent);
     std::shared_ptr<FakeCall> request(FakeConnection& connection, std::string className, std::int64_t queryId,
-                                      Dictionary fields = {})
-    {
-        fields.set("class", std::move(className));
-        fields.set("queryId", queryId);
-        if (!fields.contains("scale")) fields.set("scale", 2.0);
-        if (!fields.contains("keyboardInputMode")) fields.set("keyboardInputMode", "de");
-        auto call = connection.call("Request", {std::move(fields)});
-        device.drain();
-        return call;
-    }
+                                      Dictionary fields = {});
     std::shared_ptr<FakeCall> search(FakeConnection& connection, std::int64_t queryId, std::string query,
-                                     Dictionary fields = {})
-    {
-        fields.set("queryString", std::move(query));
-        return request(connection, "TAVSearchRequest", queryId, std::move(fields));
-    }
-    std::int64_t counter(std::string_view name)
-    {
-        return device.counters.value("com.quorvane.tavrind." + std::string(name));
-    }
+                                     Dictionary fields = {});
+    std::int64_t counter(std::string_view name);
 
     static constexpr const char* kBag =
         R"({"version": "9", "searchURL": "https://s.example/search", "warmURL": "https://s.example/warm",
@@ -157,16 +75,9 @@ struct DaemonTest : testing::Test {
 };
 
 /// An answer that has neither record nor error.
-inline bool isEmptyAnswer(FakeCall& call)
-{
-    return call.answered() && call.argument(1).count() == 0 && call.argument(2).count() == 0;
-}
+bool isEmptyAnswer(FakeCall& call);
 
 /// The "reason" of a request's error.
-inline std::string reasonOf(FakeCall& call)
-{
-    const std::string* reason = call.argument(2)["userInfo"]["reason"].asString();
-    return reason ? *reason : "";
-}
+std::string reasonOf(FakeCall& call);
 
 } // namespace tavrin::test

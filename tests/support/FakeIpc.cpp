@@ -47,50 +47,35 @@ const ipc::Member* find(const std::vector<ipc::Member>& members, std::string_vie
     return found == members.end() ? nullptr : &*found;
 }
 
+/// Expects that `message` can travel under the D-Bus signature.
 void expectShape(std::string_view what, std::string_view signature, const ipc::Message& message)
-{
-    if (auto mismatch = shapeMismatch(signature, message)) ADD_FAILURE() << what << ": " << *mismatch;
-}
-
-} // namespace
-
-std::optional<std::string> shapeMismatch(std::string_view signature, const ipc::Message& message)
 {
     std::size_t index = 0;
     for (; !signature.empty(); ++index) {
         const auto type = nextType(signature);
         signature.remove_prefix(type.size());
-        if (index >= message.args.size()) return "too few arguments";
-        if (!fits(type, message.args[index], message.handles.size()))
-            return "argument " + std::to_string(index) + " is not " + std::string(type) + ": " +
-                   toJson(message.args[index]);
+        ASSERT_LT(index, message.args.size()) << what << ": too few arguments";
+        EXPECT_TRUE(fits(type, message.args[index], message.handles.size()))
+            << what << ": argument " << index << " is not " << type << ": " << toJson(message.args[index]);
     }
-    if (index < message.args.size()) return "too many arguments";
-    return std::nullopt;
+    EXPECT_EQ(index, message.args.size()) << what << ": too many arguments";
 }
 
-FakeCall::State FakeCall::state() const
-{
-    std::lock_guard lock(_mutex);
-    return _state;
-}
+} // namespace
 
 Value FakeCall::argument(std::size_t index) const
 {
-    std::lock_guard lock(_mutex);
     return _result && *_result && index < (*_result)->args.size() ? (*_result)->args[index] : Value();
 }
 
 ipc::CallResult FakeCall::take()
 {
-    std::lock_guard lock(_mutex);
     if (!_result) return std::unexpected(ipc::CallError{.name = "test.NoAnswer", .message = "there is no answer"});
     return *std::exchange(_result, std::nullopt);
 }
 
 void FakeCall::settle(State state, std::optional<ipc::CallResult> result)
 {
-    std::lock_guard lock(_mutex);
     _state = state;
     _result = std::move(result);
 }
@@ -114,7 +99,6 @@ std::shared_ptr<FakeCall> FakeConnection::call(std::string_view member, ipc::Mes
     }
     expectShape(member, found->in, arguments);
 
-    std::lock_guard lock(_mutex);
     if (!_resumed || _invalidated) {
         call->settle(FakeCall::State::Abandoned, std::nullopt);
         return call;
@@ -148,7 +132,6 @@ void FakeConnection::invalidate()
 
 void FakeConnection::finish(bool dropQueuedCalls)
 {
-    std::lock_guard lock(_mutex);
     if (dropQueuedCalls) *_dropCalls = true;
     if (std::exchange(_invalidated, true)) return;
     _handler.reset();
@@ -157,45 +140,28 @@ void FakeConnection::finish(bool dropQueuedCalls)
 
 std::vector<FakePush> FakeConnection::takePushes()
 {
-    std::lock_guard lock(_mutex);
     return std::exchange(_pushes, {});
-}
-
-bool FakeConnection::resumed() const
-{
-    std::lock_guard lock(_mutex);
-    return _resumed;
-}
-
-bool FakeConnection::invalidated() const
-{
-    std::lock_guard lock(_mutex);
-    return _invalidated;
 }
 
 void FakeConnection::exportObject(ipc::Handler handler)
 {
-    std::lock_guard lock(_mutex);
     EXPECT_FALSE(_resumed) << "exportObject after resume";
     _handler = std::make_shared<ipc::Handler>(std::move(handler));
 }
 
 void FakeConnection::setInvalidationHandler(std::move_only_function<void()> handler)
 {
-    std::lock_guard lock(_mutex);
     EXPECT_FALSE(_resumed) << "setInvalidationHandler after resume";
     _invalidationHandler = std::move(handler);
 }
 
 void FakeConnection::setPushErrorHandler(std::function<void(const std::string&)> handler)
 {
-    std::lock_guard lock(_mutex);
     _pushErrorHandler = std::move(handler);
 }
 
 void FakeConnection::resume()
 {
-    std::lock_guard lock(_mutex);
     _resumed = true;
 }
 
@@ -207,11 +173,8 @@ void FakeConnection::push(std::string_view signal, ipc::Message arguments)
         return;
     }
     expectShape(signal, found->in, arguments);
-    std::unique_lock lock(_mutex);
     if (_invalidated) {
-        const auto handler = _pushErrorHandler;
-        lock.unlock();
-        if (handler) handler("the connection has ended");
+        if (_pushErrorHandler) _pushErrorHandler("the connection has ended");
         return;
     }
     _pushes.push_back({std::string(signal), std::move(arguments)});
@@ -222,7 +185,6 @@ struct FakeTransport::Endpoint {
     const ipc::Interface interface;
     const std::string label;
     const std::string address;
-    std::mutex mutex{};
     ipc::Listener::Acceptor acceptor{};
     bool resumed = false;
 };
@@ -230,16 +192,8 @@ struct FakeTransport::Endpoint {
 class FakeTransport::FakeListener final : public ipc::Listener {
 public:
     explicit FakeListener(std::shared_ptr<Endpoint> endpoint) : _endpoint(std::move(endpoint)) {}
-    void setAcceptor(Acceptor acceptor) override
-    {
-        std::lock_guard lock(_endpoint->mutex);
-        _endpoint->acceptor = std::move(acceptor);
-    }
-    void resume() override
-    {
-        std::lock_guard lock(_endpoint->mutex);
-        _endpoint->resumed = true;
-    }
+    void setAcceptor(Acceptor acceptor) override { _endpoint->acceptor = std::move(acceptor); }
+    void resume() override { _endpoint->resumed = true; }
     [[nodiscard]] std::string endpoint() const override { return _endpoint->address; }
 
 private:
@@ -248,7 +202,6 @@ private:
 
 std::unique_ptr<ipc::Listener> FakeTransport::make(const ipc::Interface& interface, const std::string& label)
 {
-    std::lock_guard lock(_mutex);
     auto address = "unix:path=/fake/" + std::to_string(_endpoints.size());
     auto endpoint = std::make_shared<Endpoint>(interface, label, std::move(address));
     _endpoints.push_back(endpoint);
@@ -258,28 +211,16 @@ std::unique_ptr<ipc::Listener> FakeTransport::make(const ipc::Interface& interfa
 std::shared_ptr<FakeConnection> FakeTransport::connect(std::string_view interfaceOrAddress, ipc::Peer peer)
 {
     std::shared_ptr<Endpoint> endpoint;
-    {
-        std::lock_guard lock(_mutex);
-        for (const auto& candidate : _endpoints)
-            if (auto living = candidate.lock())
-                if (living->interface.name == interfaceOrAddress || living->address == interfaceOrAddress)
-                    endpoint = std::move(living);
-    }
-    if (!endpoint) return nullptr;
-
-    ipc::Listener::Acceptor acceptor;
-    {
-        std::lock_guard lock(endpoint->mutex);
-        if (endpoint->resumed) acceptor = endpoint->acceptor;
-    }
-    if (!acceptor) return nullptr;
+    for (const auto& candidate : _endpoints)
+        if (auto living = candidate.lock())
+            if (living->interface.name == interfaceOrAddress || living->address == interfaceOrAddress)
+                endpoint = std::move(living);
+    if (!endpoint || !endpoint->resumed || !endpoint->acceptor) return nullptr;
     auto queue = Queue::make(endpoint->label, Queue::Kind::Serial, _executor, _clock);
     auto connection = std::make_shared<FakeConnection>(endpoint->interface, peer, std::move(queue));
-    {
-        std::lock_guard lock(_mutex);
-        _connections.push_back(connection);
-    }
+    _connections.push_back(connection);
     // As with the real one, letting go of what the acceptor gets ends the connection.
+    const auto acceptor = endpoint->acceptor;
     acceptor(std::shared_ptr<ipc::Connection>(connection.get(),
                                               [connection](ipc::Connection*) { connection->invalidate(); }));
     return connection;
@@ -287,10 +228,7 @@ std::shared_ptr<FakeConnection> FakeTransport::connect(std::string_view interfac
 
 void FakeTransport::endAll()
 {
-    std::unique_lock lock(_mutex);
-    const auto connections = std::exchange(_connections, {});
-    lock.unlock();
-    for (const auto& connection : connections)
+    for (const auto& connection : std::exchange(_connections, {}))
         if (const auto living = connection.lock()) living->end();
 }
 

@@ -1,8 +1,6 @@
 #pragma once
 
-#include <atomic>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <vector>
@@ -15,14 +13,14 @@ class Clock;
 
 namespace platform::test {
 
-/// What became of a call that a test made. Any thread.
+/// What became of a call that a test made.
 class FakeCall {
 public:
     enum class State { Pending, Answered, Abandoned };
-    [[nodiscard]] State state() const;
-    [[nodiscard]] bool pending() const { return state() == State::Pending; }
-    [[nodiscard]] bool answered() const { return state() == State::Answered; }
-    [[nodiscard]] bool abandoned() const { return state() == State::Abandoned; }
+    [[nodiscard]] State state() const { return _state; }
+    [[nodiscard]] bool pending() const { return _state == State::Pending; }
+    [[nodiscard]] bool answered() const { return _state == State::Answered; }
+    [[nodiscard]] bool abandoned() const { return _state == State::Abandoned; }
     /// The answer's argument at `index`; the null value while there is none or for an error.
     [[nodiscard]] Value argument(std::size_t index) const;
     /// The whole answer, taken out; only once it is there.
@@ -31,7 +29,6 @@ public:
 private:
     friend class FakeConnection;
     void settle(State state, std::optional<ipc::CallResult> result);
-    mutable std::mutex _mutex;
     State _state = State::Pending;
     std::optional<ipc::CallResult> _result;
 };
@@ -55,9 +52,9 @@ public:
     void end();
     /// What was pushed so far, in order; it is taken out.
     [[nodiscard]] std::vector<FakePush> takePushes();
-    [[nodiscard]] bool resumed() const;
+    [[nodiscard]] bool resumed() const { return _resumed; }
     /// True once either side has ended the connection.
-    [[nodiscard]] bool invalidated() const;
+    [[nodiscard]] bool invalidated() const { return _invalidated; }
 
     // the service's side
     [[nodiscard]] ipc::Peer peer() const override { return _peer; }
@@ -75,12 +72,11 @@ private:
     const ipc::Interface _interface;
     const ipc::Peer _peer;
     const std::shared_ptr<Queue> _queue;
-    mutable std::mutex _mutex;
     std::shared_ptr<ipc::Handler> _handler;
     std::move_only_function<void()> _invalidationHandler;
     std::function<void(const std::string&)> _pushErrorHandler;
     std::vector<FakePush> _pushes;
-    const std::shared_ptr<std::atomic<bool>> _dropCalls = std::make_shared<std::atomic<bool>>(false);
+    const std::shared_ptr<bool> _dropCalls = std::make_shared<bool>(false);
     bool _resumed = false;
     bool _invalidated = false;
 };
@@ -108,12 +104,8 @@ private:
 
     Executor& _executor;
     Clock& _clock;
-    std::mutex _mutex;
     std::vector<std::weak_ptr<Endpoint>> _endpoints;
     std::vector<std::weak_ptr<FakeConnection>> _connections;
 };
-
-/// Why `message` can't travel under a D-Bus signature; nothing if it can.
-[[nodiscard]] std::optional<std::string> shapeMismatch(std::string_view signature, const ipc::Message& message);
 
 } // namespace platform::test

@@ -15,7 +15,6 @@ int MemoryFiles::faultOf(std::string_view operation, const fs::path& path) const
 
 Result<Bytes> MemoryFiles::read(const fs::path& path, std::size_t maximumSize)
 {
-    std::lock_guard lock(_mutex);
     if (const int error = faultOf("read", path)) return std::unexpected(Error::posix(error));
     takeIn(path);
     const auto found = files.find(path);
@@ -43,7 +42,6 @@ Result<void> MemoryFiles::writeUnsynced(const fs::path& path, std::string_view c
 
 Result<void> MemoryFiles::write(std::string_view operation, const fs::path& path, std::string_view contents)
 {
-    std::lock_guard lock(_mutex);
     if (const int error = faultOf(operation, path)) return std::unexpected(Error::posix(error));
     if (!directories.contains(path.parent_path())) return std::unexpected(Error::posix(ENOENT));
     if (directories.contains(path)) return std::unexpected(Error::posix(EISDIR));
@@ -53,7 +51,6 @@ Result<void> MemoryFiles::write(std::string_view operation, const fs::path& path
 
 Result<void> MemoryFiles::replace(const fs::path& path, const fs::path& source)
 {
-    std::lock_guard lock(_mutex);
     if (const int error = faultOf("replace", path)) return std::unexpected(Error::posix(error));
     takeIn(source);
     _written.erase(source);
@@ -74,14 +71,12 @@ Result<void> MemoryFiles::copy(const fs::path& path, const FileHandle& source, s
 Result<FileHandle> MemoryFiles::create(const fs::path& path)
 {
     if (auto made = write("make", path, ""); !made) return std::unexpected(made.error());
-    std::lock_guard lock(_mutex);
     const FileHandle& file = _written[path] = FileHandle(memfd_create("file", MFD_CLOEXEC));
     return file.duplicate();
 }
 
 Result<void> MemoryFiles::sync(const fs::path& path)
 {
-    std::lock_guard lock(_mutex);
     if (const int error = faultOf("sync", path)) return std::unexpected(Error::posix(error));
     if (!files.contains(path)) return std::unexpected(Error::posix(ENOENT));
     return {};
@@ -89,7 +84,6 @@ Result<void> MemoryFiles::sync(const fs::path& path)
 
 Result<void> MemoryFiles::createDirectories(const fs::path& path)
 {
-    std::lock_guard lock(_mutex);
     if (const int error = faultOf("mkdir", path)) return std::unexpected(Error::posix(error));
     for (fs::path each = path; each.has_relative_path(); each = each.parent_path()) {
         if (files.contains(each)) return std::unexpected(Error::posix(ENOTDIR));
@@ -100,7 +94,6 @@ Result<void> MemoryFiles::createDirectories(const fs::path& path)
 
 Result<FileInfo> MemoryFiles::info(const fs::path& path)
 {
-    std::lock_guard lock(_mutex);
     if (const int error = faultOf("info", path)) return std::unexpected(Error::posix(error));
     takeIn(path);
     if (directories.contains(path)) return FileInfo{.kind = FileInfo::Kind::Directory};
@@ -111,7 +104,6 @@ Result<FileInfo> MemoryFiles::info(const fs::path& path)
 
 Result<void> MemoryFiles::remove(const fs::path& path)
 {
-    std::lock_guard lock(_mutex);
     if (const int error = faultOf("remove", path)) return std::unexpected(Error::posix(error));
     if (files.erase(path) == 0) return std::unexpected(Error::posix(ENOENT));
     return {};
@@ -119,7 +111,6 @@ Result<void> MemoryFiles::remove(const fs::path& path)
 
 Result<void> MemoryFiles::removeDirectory(const fs::path& path)
 {
-    std::lock_guard lock(_mutex);
     if (const int error = faultOf("remove", path)) return std::unexpected(Error::posix(error));
     std::erase_if(files, [&](const auto& file) { return file.first.string().starts_with(path.string() + "/"); });
     std::erase_if(directories,
@@ -135,7 +126,6 @@ Result<void> MemoryFiles::syncDirectory(const fs::path& path)
 
 Result<std::vector<std::string>> MemoryFiles::list(const fs::path& path)
 {
-    std::lock_guard lock(_mutex);
     if (const int error = faultOf("list", path)) return std::unexpected(Error::posix(error));
     if (!directories.contains(path)) return std::unexpected(Error::posix(ENOENT));
     std::vector<std::string> names;
@@ -165,14 +155,12 @@ Result<FileHandle> MemoryFiles::lock(const fs::path& path)
 Result<FileHandle> MemoryFiles::takeDirectory(const fs::path& path)
 {
     if (const int error = faultOf("take", path)) return std::unexpected(Error::posix(error));
-    std::lock_guard lock(_mutex);
     for (fs::path each = path; each.has_relative_path(); each = each.parent_path()) directories.insert(each);
     return FileHandle(memfd_create("lock", MFD_CLOEXEC));
 }
 
 Result<Sqlite> MemoryFiles::openDatabase(const fs::path& path, Sqlite::Access access)
 {
-    std::lock_guard lock(_mutex);
     if (const int error = faultOf("database", path)) return std::unexpected(Error::posix(error));
     if (!_databases) _databases.emplace("/dev/shm");
     const fs::path real = _databases->path / path.relative_path();
@@ -197,14 +185,9 @@ Result<FileHandle> MemoryFiles::createTemporary()
 class MemoryFiles::Appending final : public AppendFile {
 public:
     Appending(MemoryFiles& files, fs::path path) : _files(files), _path(std::move(path)) {}
-    std::uint64_t size() const override
-    {
-        std::lock_guard lock(_files._mutex);
-        return _files.files[_path].size();
-    }
+    std::uint64_t size() const override { return _files.files[_path].size(); }
     Result<void> append(std::initializer_list<std::string_view> parts) override
     {
-        std::lock_guard lock(_files._mutex);
         if (const int error = _files.faultOf("append", _path)) return std::unexpected(Error::posix(error));
         for (const std::string_view part : parts) _files.files[_path] += part;
         return {};
@@ -217,7 +200,6 @@ private:
 
 Result<std::unique_ptr<AppendFile>> MemoryFiles::createForAppending(const fs::path& path)
 {
-    std::lock_guard lock(_mutex);
     if (const int error = faultOf("create", path)) return std::unexpected(Error::posix(error));
     if (!directories.contains(path.parent_path())) return std::unexpected(Error::posix(ENOENT));
     if (files.contains(path) || directories.contains(path)) return std::unexpected(Error::posix(EEXIST));

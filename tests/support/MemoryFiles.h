@@ -2,7 +2,6 @@
 
 #include <functional>
 #include <map>
-#include <mutex>
 #include <optional>
 #include <set>
 
@@ -11,8 +10,8 @@
 
 namespace platform::test {
 
-/// Files in memory. An operation fails when the test says so. A database is a real one, in a directory in /dev/shm;
-/// here it is an empty file, and one that a test made has its contents.
+/// Files in memory, for one thread. An operation fails when the test says so. A database is a real one, in a directory
+/// in /dev/shm; here it is an empty file, and one that a test made has its contents.
 class MemoryFiles final : public FileSystem {
 public:
     /// Asked before every operation ("read", "write", "replace", "mkdir", "info", "remove", "list", "create", "append",
@@ -53,7 +52,6 @@ private:
 
     std::map<std::filesystem::path, FileHandle> _written; ///< of `create`: whoever has the handle may still write
     std::optional<TemporaryDirectory> _databases;
-    std::mutex _mutex;
 };
 
 } // namespace platform::test

@@ -32,6 +32,14 @@ inline void writeFile(const std::filesystem::path& path, std::string_view conten
     std::ofstream(path, std::ios::binary) << contents;
 }
 
+/// The permission bits of a file; 0 if there is none.
+inline unsigned modeOf(const std::filesystem::path& path)
+{
+    std::error_code none;
+    const auto status = std::filesystem::status(path, none);
+    return std::filesystem::exists(status) ? static_cast<unsigned>(status.permissions()) : 0;
+}
+
 /// Dispatches the loop until `done`; false where that takes more than ten seconds.
 template <class Done> bool runUntil(RunLoop& loop, Done done)
 {

@@ -4,7 +4,6 @@
 #include <string>
 #include <vector>
 
-#include "platform/base/Log.h"
 #include "platform/device/DataDetectorStore.h"
 #include "platform/device/Device.h"
 #include "platform/device/DeviceProfile.h"
@@ -21,11 +20,11 @@
 #include "platform/run/NotificationCenter.h"
 #include "platform/run/Transactions.h"
 #include "tests/support/BackgroundLoads.h"
+#include "tests/support/ByHand.h"
 #include "tests/support/FakeActivities.h"
 #include "tests/support/FakeIpc.h"
 #include "tests/support/FakeUrlLoader.h"
-#include "tests/support/ManualClock.h"
-#include "tests/support/ManualExecutor.h"
+#include "tests/support/LogCapture.h"
 #include "tests/support/MemoryFiles.h"
 
 namespace platform::test {
@@ -51,11 +50,7 @@ struct FakeLocation final : LocationSource {
     std::optional<Location> current() override { return place; }
     void requestUpdate() override { ++updatesRequested; }
     void onChange(Handler newHandler) override { handler = std::move(newHandler); }
-    void moveTo(std::optional<Location> location)
-    {
-        place = location;
-        handler(location, location ? "" : "lost");
-    }
+    void moveTo(std::optional<Location> location);
 };
 
 struct FakeProfile final : DeviceProfileSource {
@@ -66,11 +61,7 @@ struct FakeProfile final : DeviceProfileSource {
     {
         handlers.push_back(std::move(handler));
     }
-    void change(DeviceProfile profile)
-    {
-        current = std::move(profile);
-        for (const auto& handler : handlers) handler(current);
-    }
+    void change(DeviceProfile profile);
 };
 
 struct FakeApplications final : InstalledApplications {
@@ -102,39 +93,17 @@ struct FakeSubscriptions final : SubscriptionServices {
 struct FakeProcesses final : ProcessIdentity {
     std::map<pid_t, std::string> applications;
     std::map<pid_t, std::string> paths;
-    std::optional<std::string> applicationId(pid_t pid) override
-    {
-        const auto found = applications.find(pid);
-        return found == applications.end() ? std::nullopt : std::optional(found->second);
-    }
-    Result<std::string> executablePath(pid_t pid) override
-    {
-        const auto found = paths.find(pid);
-        if (found == paths.end()) return std::unexpected(Error::posix(ENOENT));
-        return found->second;
-    }
+    std::optional<std::string> applicationId(pid_t pid) override;
+    Result<std::string> executablePath(pid_t pid) override;
 };
 
 struct FakeMemoryPressure final : MemoryPressure {
     int watchers = 0;
-    std::unique_ptr<Watch> watch(std::function<void()> critical) override
-    {
-        return std::make_unique<Registration>(*this, std::move(critical));
-    }
+    std::unique_ptr<Watch> watch(std::function<void()> critical) override;
     void raise() { center.post({.name = "critical"}); }
 
 private:
-    struct Registration final : Watch {
-        Registration(FakeMemoryPressure& owner_, std::function<void()> critical)
-            : owner(owner_),
-              token(owner.center.observe("critical", [critical = std::move(critical)](auto&) { critical(); }))
-        {
-            ++owner.watchers;
-        }
-        ~Registration() override { --owner.watchers; }
-        FakeMemoryPressure& owner;
-        NotificationCenter::Token token;
-    };
+    struct Registration;
     NotificationCenter center;
 };
 
@@ -143,57 +112,11 @@ struct FakeNotifier final : SystemNotifier {
     void post(const std::string& name) override { posted.push_back(name); }
 };
 
-/// Collects what is logged while it lives.
-class LogCapture {
-public:
-    struct Line {
-        LogLevel level;
-        std::string category;
-        std::string text;
-    };
-    /// Lines that contain `part`.
-    [[nodiscard]] int count(std::string_view part) const
-    {
-        std::lock_guard lock(_mutex);
-        int found = 0;
-        for (const Line& line : _lines) found += line.text.contains(part);
-        return found;
-    }
-    [[nodiscard]] bool has(LogLevel level, std::string_view category, std::string_view part) const
-    {
-        std::lock_guard lock(_mutex);
-        for (const Line& line : _lines)
-            if (line.level == level && line.category == category && line.text.contains(part)) return true;
-        return false;
-    }
+/// A device of twins, on one thread.
+struct TestDevice : ByHand {
+    TestDevice();
+    ~TestDevice();
 
-private:
-    mutable std::mutex _mutex;
-    std::vector<Line> _lines;
-    LogTap _tap{[this](const LogLine& line) {
-        std::lock_guard lock(_mutex);
-        _lines.push_back({line.level, std::string(line.category), std::string(line.text)});
-    }};
-};
-
-/// A device of twins, on one thread: work waits until `drain`, time until `advance`.
-struct TestDevice {
-    TestDevice()
-    {
-        failOnReplyMisuse();
-        Log::threshold = LogLevel::Fault; // what is expected is captured, not printed
-        Log::privateData = true;
-        device.makeQueues();
-    }
-
-    void drain() { executor.drain(); }
-    void advance(Duration by)
-    {
-        clock.advance(by, [this] { drain(); });
-    }
-
-    ManualClock clock;
-    ManualExecutor executor;
     MemoryFiles files;
     UserDefaults userDefaults;
     UserDefaults lookupDefaults;

@@ -1,9 +1,9 @@
 #include "tests/support/TestHttpServer.h"
 
-#include <arpa/inet.h>
 #include <array>
 #include <charconv>
 #include <csignal>
+#include <netdb.h>
 #include <netinet/in.h>
 #include <poll.h>
 #include <sys/eventfd.h>
@@ -103,21 +103,17 @@ struct TestHttpServer::Impl {
 
     void listen()
     {
-        sockaddr_in6 v6{};
-        v6.sin6_family = AF_INET6;
-        sockaddr_in v4{};
-        v4.sin_family = AF_INET;
-        const bool isV6 = inet_pton(AF_INET6, options.address.c_str(), &v6.sin6_addr) == 1;
-        if (!isV6) inet_pton(AF_INET, options.address.c_str(), &v4.sin_addr);
-        auto* address = isV6 ? reinterpret_cast<sockaddr*>(&v6) : reinterpret_cast<sockaddr*>(&v4);
-        socklen_t size = isV6 ? sizeof v6 : sizeof v4;
-        listener = FileHandle(socket(address->sa_family, SOCK_STREAM | SOCK_CLOEXEC, 0));
-        if (bind(listener.fd(), address, size) != 0 || ::listen(listener.fd(), 64) != 0 ||
-            getsockname(listener.fd(), address, &size) != 0) {
+        const addrinfo numeric{.ai_flags = AI_NUMERICHOST | AI_PASSIVE, .ai_socktype = SOCK_STREAM};
+        addrinfo* address = nullptr;
+        getaddrinfo(options.address.c_str(), "0", &numeric, &address);
+        listener = FileHandle(socket(address->ai_family, SOCK_STREAM | SOCK_CLOEXEC, 0));
+        sockaddr_in6 bound{}; // has the port where an IPv4 address has it
+        socklen_t size = sizeof bound;
+        if (bind(listener.fd(), address->ai_addr, address->ai_addrlen) != 0 || ::listen(listener.fd(), 64) != 0 ||
+            getsockname(listener.fd(), reinterpret_cast<sockaddr*>(&bound), &size) != 0)
             ADD_FAILURE() << "no server at " << options.address << ": " << Error::posix(errno).description();
-            return;
-        }
-        port = ntohs(isV6 ? v6.sin6_port : v4.sin_port);
+        freeaddrinfo(address);
+        port = ntohs(bound.sin6_port);
     }
 
     void run()

@@ -1,0 +1,127 @@
+#include "tests/support/DaemonFixture.h"
+
+namespace tavrin::test {
+
+RecordingSessionManager::RecordingSessionManager(Assembly& assembly)
+    : ClientSessionManager(assembly, assembly.guidController, "test")
+{}
+
+void RecordingSessionManager::addTavrinFeedback(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void>)
+{
+    records.push_back(std::move(feedback));
+}
+
+std::vector<std::string> RecordingSessionManager::takeClasses()
+{
+    std::vector<std::string> classes;
+    for (const auto& record : std::exchange(records, {})) classes.emplace_back(record->feedback()->className());
+    return classes;
+}
+
+DaemonTest::DaemonTest() = default;
+
+DaemonTest::~DaemonTest()
+{
+    device.files.fault = {}; // it may refer to what the test had
+    settle();
+}
+
+void DaemonTest::settle()
+{
+    const auto endLoads = [this] {
+        do device.drain();
+        while (device.loader.cancelAll());
+    };
+    endLoads();
+    device.ipc.endAll();
+    endLoads(); // what is recorded of a client's end may ask for a fresh bag
+}
+
+void DaemonTest::start()
+{
+    settle();
+    daemon.reset();
+    device.drain();
+    device.loader.sessions.clear();
+    daemon = startUp(device.device).value();
+    if (recordFeedback)
+        assembly().clientSessionManager = session = std::make_shared<RecordingSessionManager>(assembly());
+    device.drain();
+}
+
+void DaemonTest::startWithoutBag()
+{
+    device.files.files.clear();
+    start();
+}
+
+std::vector<std::shared_ptr<platform::test::FakeUrlLoader::Task>>& DaemonTest::tasks()
+{
+    return device.loader.sessions.at(0)->tasks;
+}
+
+void DaemonTest::respond(std::string body, int status, platform::HttpHeaders headers)
+{
+    lastTask()->respond(status, std::move(body), std::move(headers));
+    device.drain();
+}
+
+std::shared_ptr<FakeConnection> DaemonTest::connect(pid_t pid)
+{
+    auto connection = device.ipc.connect("com.quorvane.TAVDaemonXPC", {.pid = pid, .uid = 0});
+    device.drain();
+    return connection;
+}
+
+std::shared_ptr<FakeConnection> DaemonTest::client(std::string identifier, std::string agent, pid_t pid)
+{
+    auto connection = connect(pid);
+    configure(*connection, std::move(identifier), std::move(agent));
+    return connection;
+}
+
+std::shared_ptr<FakeCall> DaemonTest::configure(FakeConnection& connection, std::string identifier, std::string agent)
+{
+    auto call = connection.call("Configure", {Value::dictionaryOf({{"class", "TAVSessionConfiguration"},
+                                                                   {"identifier", std::move(identifier)},
+                                                                   {"userAgent", std::move(agent)}})});
+    device.drain();
+    return call;
+}
+
+std::shared_ptr<FakeCall> DaemonTest::request(FakeConnection& connection, std::string className, std::int64_t queryId,
+                                              Dictionary fields)
+{
+    fields.set("class", std::move(className));
+    fields.set("queryId", queryId);
+    if (!fields.contains("scale")) fields.set("scale", 2.0);
+    if (!fields.contains("keyboardInputMode")) fields.set("keyboardInputMode", "de");
+    auto call = connection.call("Request", {std::move(fields)});
+    device.drain();
+    return call;
+}
+
+std::shared_ptr<FakeCall> DaemonTest::search(FakeConnection& connection, std::int64_t queryId, std::string query,
+                                             Dictionary fields)
+{
+    fields.set("queryString", std::move(query));
+    return request(connection, "TAVSearchRequest", queryId, std::move(fields));
+}
+
+std::int64_t DaemonTest::counter(std::string_view name)
+{
+    return device.counters.value("com.quorvane.tavrind." + std::string(name));
+}
+
+bool isEmptyAnswer(FakeCall& call)
+{
+    return call.answered() && call.argument(1).count() == 0 && call.argument(2).count() == 0;
+}
+
+std::string reasonOf(FakeCall& call)
+{
+    const std::string* reason = call.argument(2)["userInfo"]["reason"].asString();
+    return reason ? *reason : "";
+}
+
+} // namespace tavrin::test
