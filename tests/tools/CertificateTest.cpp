@@ -1,7 +1,5 @@
 #include "tools/shared/Certificate.h"
 
-#include <sys/stat.h>
-
 #include <gtest/gtest.h>
 
 #include "tests/support/TemporaryDirectory.h"
@@ -10,13 +8,8 @@ namespace tavrin::tools {
 namespace {
 
 using namespace std::chrono_literals;
+using platform::test::modeOf;
 using platform::test::writeFile;
-
-unsigned mode(const std::filesystem::path& path)
-{
-    struct stat info{};
-    return stat(path.c_str(), &info) == 0 ? info.st_mode & 0777 : 0;
-}
 
 TEST(Certificate, IsKeptWhileItCanServeForAnotherDay)
 {
@@ -29,8 +22,8 @@ TEST(Certificate, IsKeptWhileItCanServeForAnotherDay)
         return files.made;
     };
     EXPECT_TRUE(isMade(now));
-    EXPECT_EQ(mode(directory), 0700u);
-    EXPECT_EQ(mode(files.key), 0600u);
+    EXPECT_EQ(modeOf(directory), 0700u);
+    EXPECT_EQ(modeOf(files.key), 0600u);
     EXPECT_FALSE(isMade(now + 215h));
     EXPECT_TRUE(isMade(now + 217h)) << "23 hours are left";
     EXPECT_TRUE(isMade(now)) << "not valid yet, by a clock that was set back";
@@ -39,11 +32,9 @@ TEST(Certificate, IsKeptWhileItCanServeForAnotherDay)
     EXPECT_TRUE(isMade(now, "dev.example"));
     writeFile(files.certificate, "no certificate");
     EXPECT_TRUE(isMade(now));
-    const std::filesystem::path other = temporary / "other";
-    std::filesystem::copy(files.key, other);
-    std::filesystem::remove(files.key);
+    std::filesystem::rename(files.key, temporary / "other");
     EXPECT_TRUE(isMade(now)) << "no key";
-    std::filesystem::rename(other, files.key);
+    std::filesystem::rename(temporary / "other", files.key);
     EXPECT_TRUE(isMade(now)) << "the key of another certificate";
 }
 

@@ -1,10 +1,10 @@
+#include <array>
 #include <fstream>
 #include <map>
 #include <regex>
-#include <sys/mman.h>
 #include <thread>
-#include <unistd.h>
 
+#include <fmt/format.h>
 #include <gmock/gmock.h>
 
 #include "CoreTavrin/TAVBag.h"
@@ -42,10 +42,7 @@ struct EchoDaemon final : TAVDaemonXPC, TAVDiagnosticsXPC, TAVEndpointXPC {
     std::shared_ptr<TAVClientXPC> client;
     std::weak_ptr<platform::ipc::Connection> connection;
     std::string endpoint;
-    std::unique_ptr<platform::ipc::Listener> flusher;
     std::vector<RequestReply> held;
-    std::mutex mutex;
-    std::vector<std::string> events;
 
     void configure(std::shared_ptr<TAVSessionConfiguration> configuration, platform::Reply<std::string> reply) override
     {
@@ -67,33 +64,16 @@ struct EchoDaemon final : TAVDaemonXPC, TAVDiagnosticsXPC, TAVEndpointXPC {
         echoed->rawResponse = platform::Bytes(std::string(request->className()) + ":" + request->queryString);
         reply(request->queryId, std::move(echoed), std::nullopt);
     }
-    void reportEvent(const std::string& event, std::int64_t queryId, std::shared_ptr<ZRFeedback> feedback,
-                     std::shared_ptr<void>) override
-    {
-        std::lock_guard lock(mutex);
-        events.push_back(event + " " + std::to_string(queryId) + " " + std::string(feedback->className()));
-    }
+    void reportEvent(const std::string&, std::int64_t, std::shared_ptr<ZRFeedback>, std::shared_ptr<void>) override {}
     void feedback(const std::string&, platform::Reply<Value::Array, OptionalError> reply) override
     {
-        std::lock_guard lock(mutex);
-        Value::Array all;
-        for (const std::string& event : events) all.push_back(Value::dictionaryOf({{"event", event}}));
-        reply(std::move(all), std::nullopt);
+        reply({}, std::nullopt);
     }
-    void listenToFlusher(platform::Reply<std::string> reply) override
-    {
-        reply(flusher ? flusher->endpoint() : "unix:path=/flusher");
-    }
-    void listSessions(platform::Reply<Value::Array> reply) override
-    {
-        reply({Value::dictionaryOf({{"identifier", "com.example"}, {"agent", "Example/1"}})});
-    }
+    void listenToFlusher(platform::Reply<std::string> reply) override { reply(""); }
+    void listSessions(platform::Reply<Value::Array> reply) override { reply({}); }
     void fileHandleAndAttributesForResource(const std::string& resource, ResourceReply reply) override
     {
-        if (resource.empty()) return reply({}, {}, makeTAVError(TAVErrorNotFound, "no such resource"));
-        platform::FileHandle file(memfd_create("resource", MFD_CLOEXEC));
-        EXPECT_EQ(write(file.fd(), resource.data(), resource.size()), static_cast<ssize_t>(resource.size()));
-        reply(std::move(file), Value::dictionaryOf({{"version", 3}}), std::nullopt);
+        reply({}, {}, makeTAVError(TAVErrorNotFound, resource));
     }
     void request(std::shared_ptr<TAVRequest> request, std::shared_ptr<TAVSessionConfiguration> configuration,
                  RequestReply reply) override
@@ -105,12 +85,11 @@ struct EchoDaemon final : TAVDaemonXPC, TAVDiagnosticsXPC, TAVEndpointXPC {
     void loadImages(Value::Array images, std::uint64_t timeout, platform::Reply<Value> reply) override
     {
         Dictionary loaded;
-        for (const Value& image : images)
-            loaded.set(*image["id"].asString(), platform::Bytes(std::string("\0pixels", 7) + std::to_string(timeout)));
+        for (const Value& image : images) loaded.set(*image["id"].asString(), platform::Bytes(std::to_string(timeout)));
         reply(std::move(loaded));
     }
-    Value status() override { return Value::dictionaryOf({{"pid", 1}}); }
-    std::string statistics() override { return "# EOF\n"; }
+    Value status() override { return Dictionary(); }
+    std::string statistics() override { return ""; }
 };
 
 /// The daemon's listeners on real sockets, with an `EchoDaemon` behind them.
@@ -146,7 +125,6 @@ struct ClientTest : testing::Test {
         thread.join();
         for (RequestReply& reply : daemon->held) reply.abandon();
         connections.clear();
-        daemon->flusher.reset();
         listener.reset();
         endpoint.reset();
         transport.reset();
@@ -172,48 +150,23 @@ struct ClientTest : testing::Test {
     std::unique_ptr<TAVClient> client;
 };
 
-TEST_F(ClientTest, EveryOperationCrossesBothWays)
+TEST_F(ClientTest, AnswersErrorsAndPushesArrive)
 {
     std::optional<TAVBagAnswer> pushed;
     client->onBagDidLoad([&](TAVBagAnswer answer) { pushed = std::move(answer); });
     EXPECT_EQ(client->configure({"com.example", "Example/1"}).value(), daemon->endpoint);
     ASSERT_TRUE(client->wait([&] { return pushed.has_value(); }, 30s));
-    EXPECT_EQ(pushed->bag->version(), "7");
     EXPECT_EQ(pushed->error, makeTAVError(TAVErrorBagFetch, "Example/1"));
-
-    EXPECT_EQ(client->bag()->bag->rawBag()["version"], Value("7"));
-    const auto answer = client->request(search("grüße", 5)).value();
-    EXPECT_EQ(answer.queryId, 5);
-    EXPECT_EQ(answer.reply->rawResponse->view(), "TAVSearchRequest:grüße");
-    EXPECT_FALSE(answer.error);
+    EXPECT_EQ(client->bag()->bag->version(), "7");
+    EXPECT_EQ(client->request(search("grüße", 5))->reply->rawResponse->view(), "TAVSearchRequest:grüße");
     EXPECT_EQ(client->request(search("fail", 6))->error->reason(), "no URL");
-
-    client->reportEvent("seen", 5, ZRSearchViewAppearFeedback());
-    EXPECT_EQ(client->feedback().value(),
-              Value::Array{Value::dictionaryOf({{"event", "seen 5 ZRSearchViewAppearFeedback"}})});
-    EXPECT_EQ(client->listenToFlusher().value(), "unix:path=/flusher");
-    EXPECT_EQ(client->sessions()->front()["agent"], Value("Example/1"));
-    EXPECT_EQ(client->status().value()["pid"], Value(1));
-    EXPECT_EQ(client->statistics().value(), "# EOF\n");
-
-    const auto resource = client->resource("TAVQIFeatures").value();
-    char content[32] = {};
-    EXPECT_EQ(pread(resource.file.fd(), content, sizeof(content), 0), 13) << "a descriptor of one's own";
-    EXPECT_STREQ(content, "TAVQIFeatures");
-    EXPECT_EQ(resource.attributes["version"], Value(3));
-    const auto missing = client->resource("").value();
-    EXPECT_FALSE(missing.file);
-    EXPECT_EQ(missing.error->code, TAVErrorNotFound);
+    EXPECT_EQ(client->resource("TAVQIFeatures")->error, makeTAVError(TAVErrorNotFound, "TAVQIFeatures"));
 
     auto view = TAVEndpointClient::connect(daemon->endpoint).value();
     EXPECT_EQ(view->request(TAVMoreResultsRequest(), {"com.example", "Example/1"})->reply->geoSessionEntityString,
               "com.example");
-    EXPECT_EQ(view->loadImages({Dictionary{{"id", "a"}}, Dictionary{{"id", "b"}}}, 3ms).value(),
-              (std::map<std::string, platform::Bytes>{{"a", platform::Bytes(std::string("\0pixels3000000", 14))},
-                                                      {"b", platform::Bytes(std::string("\0pixels3000000", 14))}}));
-    EXPECT_EQ(view->loadImages({Dictionary{{"id", "a"}}}, 2min)->at("a").view().substr(7), "60000000000")
-        << "a minute at most";
-    EXPECT_EQ(view->loadImages({Dictionary{{"id", "a"}}}, -1s)->at("a").view().substr(7), "0");
+    for (const auto& [limit, sent] : {std::pair(3ms, "3000000"), {2min, "60000000000"}, {-1s, "0"}})
+        EXPECT_EQ(view->loadImages({Dictionary{{"id", "a"}}}, limit)->at("a").view(), sent) << "a minute at most";
 }
 
 TEST_F(ClientTest, RequestsAreOutstandingSideBySide)
@@ -243,43 +196,6 @@ TEST_F(ClientTest, SilenceEndsInATimeOut)
     EXPECT_THAT(answer.error().reason(), testing::HasSubstr("no answer to Request within 0.02 s"));
 }
 
-/// A bridge that tells its tool of the intent, in all three ways.
-struct EchoBridge final : TAVFlusherXPC {
-    std::shared_ptr<TAVFlusherListener> tool;
-    void initiateConnectionWithIntent(std::uint64_t intent) override
-    {
-        tool->flushedData(platform::Bytes("body"));
-        tool->receivedFeedbackDescription("intent " + std::to_string(intent));
-        tool->workDone();
-    }
-};
-
-struct Notes final : TAVFlusherListener {
-    std::vector<std::string> all;
-    void flushedData(const platform::Bytes& body) override { all.emplace_back(body.view()); }
-    void receivedFeedbackDescription(const std::string& description) override { all.push_back(description); }
-    void workDone() override { all.emplace_back("done"); }
-};
-
-TEST_F(ClientTest, TheBridgeAnswersAndTellsItsTool)
-{
-    auto bridge = std::make_shared<EchoBridge>();
-    daemon->flusher = transport->anonymous(flusherInterface(), "test.flusher");
-    daemon->flusher->setAcceptor([&](auto connection) {
-        bridge->tool = makeFlusherListenerProxy(connection);
-        connection->exportObject(flusherHandler(bridge));
-        connection->resume();
-        connections.push_back(std::move(connection));
-    });
-    daemon->flusher->resume();
-
-    Notes notes;
-    const auto tool = TAVFlusherClient::connect(client->listenToFlusher().value(), notes).value();
-    ASSERT_TRUE(tool->initiateConnection(FlusherIntent::Dump));
-    ASSERT_TRUE(tool->wait([&] { return notes.all.size() == 3; }, 30s));
-    EXPECT_EQ(notes.all, (std::vector<std::string>{"body", "intent 3", "done"}));
-}
-
 TEST_F(ClientTest, AReportedEventIsTakenOrRefused)
 {
     std::vector<bool> taken;
@@ -293,45 +209,39 @@ TEST_F(ClientTest, AReportedEventIsTakenOrRefused)
     EXPECT_TRUE(client->status()) << "the connection lives on";
 }
 
-/// The members that an introspection text describes, a line each.
-std::vector<std::string> membersIn(std::string_view introspection)
+/// By the name of a member: types and names of its arguments, in and out, and whether it has no reply.
+using Members = std::map<std::string, std::array<std::string, 5>>;
+
+Members membersIn(const std::string& introspection)
 {
-    const std::regex tag(R"re(<(interface|method|signal|arg|annotation) name="([^"]+)"(?: type="([^"]+)")?)re"
-                         R"re((?: direction="([^"]+)")?(?: value="([^"]+)")?)re");
-    std::vector<std::string> members;
-    std::string interface, in, out, inNames, outNames, name, suffix;
-    const auto finish = [&] {
-        if (!name.empty())
-            members.push_back(interface + "." + name + "(" + in + inNames + ")" + out + outNames + suffix);
-        in = out = inNames = outNames = name = suffix = "";
-    };
-    for (std::cregex_iterator found(introspection.begin(), introspection.end(), tag), end; found != end; ++found) {
+    const std::regex tag(R"re(<(\w+) name="([^"]+)"(?: type="([^"]+)")?(?: direction="(\w+)")?)re");
+    Members members;
+    std::string interface, name;
+    for (std::sregex_iterator found(introspection.begin(), introspection.end(), tag), end; found != end; ++found) {
         const std::string kind = (*found)[1];
         if (kind == "arg") {
-            ((*found)[4] == "out" ? out : in) += (*found)[3];
-            ((*found)[4] == "out" ? outNames : inNames) += " " + std::string((*found)[2]);
+            const std::size_t way = (*found)[4] == "out" ? 2 : 0;
+            members[name].at(way) += (*found)[3];
+            members[name].at(way + 1) += (members[name].at(way + 1).empty() ? "" : " ") + std::string((*found)[2]);
         } else if (kind == "annotation") {
-            suffix = " " + std::string((*found)[2]) + " " + std::string((*found)[5]);
+            members[name][4] = (*found)[2];
         } else {
-            finish();
-            (kind == "interface" ? interface : name) = (*found)[2];
+            (kind == "interface" ? interface : name) =
+                kind == "interface" ? (*found)[2].str() : interface + "." + (*found)[2].str();
+            if (kind != "interface") members[name];
         }
     }
-    finish();
     return members;
 }
 
-std::vector<std::string> membersOf(const platform::ipc::Interface& interface)
+Members membersOf(const platform::ipc::Interface& interface)
 {
-    std::vector<std::string> members;
+    Members members;
     const auto add = [&](std::string_view home, const std::vector<platform::ipc::Member>& all) {
-        for (const auto& member : all) {
-            const auto names = [](std::string_view list) { return list.empty() ? "" : " " + std::string(list); };
-            members.push_back(std::string(member.interface.empty() ? home : member.interface) + "." +
-                              std::string(member.name) + "(" + std::string(member.in) + names(member.inNames) + ")" +
-                              std::string(member.out) + names(member.outNames) +
-                              (member.noReply ? " org.freedesktop.DBus.Method.NoReply true" : ""));
-        }
+        for (const auto& each : all)
+            members[fmt::format("{}.{}", each.interface.empty() ? home : each.interface, each.name)] = {
+                std::string(each.in), std::string(each.inNames), std::string(each.out), std::string(each.outNames),
+                each.noReply ? "org.freedesktop.DBus.Method.NoReply" : ""};
     };
     add(interface.name, interface.methods);
     add(interface.listenerName, interface.signals);
@@ -341,7 +251,7 @@ std::vector<std::string> membersOf(const platform::ipc::Interface& interface)
 TEST(Introspection, DescribesEveryMemberAsItIsServed)
 {
     for (const platform::ipc::Interface* interface : {&daemonInterface(), &endpointInterface(), &flusherInterface()})
-        EXPECT_THAT(membersIn(interface->introspection), testing::UnorderedElementsAreArray(membersOf(*interface)));
+        EXPECT_EQ(membersIn(std::string(interface->introspection)), membersOf(*interface));
 }
 
 TEST(Records, EveryEventAndItsFieldsAreDocumented)
