@@ -1,5 +1,6 @@
 #pragma once
 
+#include <algorithm>
 #include <cstddef>
 #include <cstdint>
 #include <cstdio>
@@ -8,10 +9,21 @@
 #include <string>
 #include <string_view>
 
-/// The input of a fuzz target as text.
-inline std::string_view textOf(const std::uint8_t* data, std::size_t size)
+/// What a fuzz target does with an input. Each target is one source, which defines it.
+void runInput(std::string_view input);
+
+extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
 {
-    return {reinterpret_cast<const char*>(data), size};
+    runInput({reinterpret_cast<const char*>(data), size});
+    return 0;
+}
+
+/// Removes the first line of `text` and returns it without its end.
+inline std::string_view takeLine(std::string_view& text)
+{
+    const std::string_view first = text.substr(0, text.find('\n'));
+    text.remove_prefix(std::min(first.size() + 1, text.size()));
+    return first;
 }
 
 /// Ends the process, which the fuzzer counts as a crash, unless `holds`. `seen` is what was found instead.
@@ -23,5 +35,3 @@ inline void check(bool holds, const std::string& seen = {},
                  seen.c_str());
     std::abort();
 }
-
-extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size);

@@ -3,9 +3,9 @@
 
 /// An archive of any record, as a session file holds it. What decodes can be encoded again, to an equal record; and so
 /// it is for the archive read as plain values.
-int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
+void runInput(std::string_view input)
 {
-    const auto record = platform::unarchive(textOf(data, size), tavrin::tavrindRecordClasses());
+    const auto record = platform::unarchive(input, tavrin::tavrindRecordClasses());
     if (record) {
         fuzz::checkRoundTrips(**record);
         fuzz::checkUpload(*record);
@@ -13,13 +13,12 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
         fuzz::checkRefusal(record.error());
     }
 
-    const auto value = platform::valueFromArchive(textOf(data, size));
+    const auto value = platform::valueFromArchive(input);
     if (!value) {
         fuzz::checkRefusal(value.error());
-        return 0;
+        return;
     }
     const std::string again = platform::archiveValue(*value);
     const auto same = platform::valueFromArchive(again);
     check(same && platform::archiveValue(*same) == again);
-    return 0;
 }

@@ -53,10 +53,10 @@ void checkProblems(const TAVBag& bag)
 
 /// Any JSON document as a raw bag: its values are in range, wrong ones read as defaults and are named, and every
 /// client's view survives the way over IPC.
-int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
+void runInput(std::string_view input)
 {
-    const auto raw = platform::parseJson(textOf(data, size));
-    if (!raw) return 0;
+    const auto raw = platform::parseJson(input);
+    if (!raw) return;
     checkProblems(TAVBag(*raw, ""));
     for (const char* userAgent : {"", "Vistrel/4.2", "news/1"}) {
         const TAVBag bag(*raw, userAgent);
@@ -67,5 +67,4 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
         check(received->searchURL() == bag.searchURL() && received->isEnabled() == bag.isEnabled());
         check(received->minimumQueryLength() == bag.minimumQueryLength() && received->version() == bag.version());
     }
-    return 0;
 }

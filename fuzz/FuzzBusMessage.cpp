@@ -34,17 +34,17 @@ constexpr std::size_t kSafeDepth = 20;
 
 /// A dictionary from one end to the other, read from JSON with bytes and dates as `fuzz::enriched` has them. What is
 /// written is read as the same, and is refused one byte below its size in memory.
-int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
+void runInput(std::string_view input)
 {
-    const auto json = parseJson(textOf(data, size));
-    if (!json || !json->asDictionary()) return 0;
+    const auto json = parseJson(input);
+    if (!json || !json->asDictionary()) return;
     const Value value = fuzz::enriched(*json);
 
     const auto message = newMessage();
     const auto written = ipc::encodeArguments(message.get(), "a{sv}", {.args = {value}, .handles = {}});
     if (!written) {
         check(!written.error().empty() && fuzz::depthOf(value) > kSafeDepth, written.error());
-        return 0;
+        return;
     }
     check(sd_bus_message_seal(message.get(), 1, 0) >= 0);
     const auto read = ipc::decodeArguments(message.get(), SIZE_MAX);
@@ -56,5 +56,4 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
     sd_bus_message_rewind(message.get(), true);
     const auto refused = ipc::decodeArguments(message.get(), read->size - 1);
     check(!refused && refused.error().name == SD_BUS_ERROR_LIMITS_EXCEEDED, refused ? "" : refused.error().name);
-    return 0;
 }

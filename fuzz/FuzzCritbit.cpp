@@ -5,15 +5,14 @@
 
 /// The input is a list of operations on a tree: a byte that says which, one with the length of the key or prefix, and
 /// its bytes, of any value. The tree must do what a map does.
-int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
+void runInput(std::string_view input)
 {
     tavrin::test::CritbitModel model;
-    std::string_view rest = textOf(data, size);
-    while (rest.size() >= 2) {
-        const char operation = rest[0];
-        const std::size_t length = static_cast<unsigned char>(rest[1]);
-        const std::string key(rest.substr(2, length));
-        rest.remove_prefix(std::min(rest.size(), 2 + length));
+    while (input.size() >= 2) {
+        const char operation = input[0];
+        const std::size_t length = static_cast<unsigned char>(input[1]);
+        const std::string key(input.substr(2, length));
+        input.remove_prefix(std::min(input.size(), 2 + length));
         switch (operation) {
         case '-': check(model.remove(key), key); break;
         case '?': check(model.walk(key), key); break;
@@ -25,5 +24,4 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
         }
     }
     check(model.walk("") && model.clear());
-    return 0;
 }

@@ -24,16 +24,15 @@ bool isPlain(char c)
 } // namespace
 
 /// The input is a link. Where it leads doesn't depend on what isn't recorded of it, and is told in one way.
-int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
+void runInput(std::string_view input)
 {
-    const std::string_view link = textOf(data, size);
-    const auto components = deepLinkComponents(link);
+    const auto components = deepLinkComponents(input);
     if (components) {
-        const std::string text = normalized(link);
+        const std::string text = normalized(input);
         check(std::ranges::all_of(text, isPlain) && !text.ends_with('/'), text);
         check(std::ranges::none_of(components->host, [](char c) { return c == '/' || c == '@'; }), components->host);
 
-        const std::string_view place = link.substr(0, link.find_first_of("?#"));
+        const std::string_view place = input.substr(0, input.find_first_of("?#"));
         check(normalized(std::string(place) + "?q=1#f") == text, text);
         const std::string_view rest = place.substr(place.find(':') + 1);
         if (rest.starts_with("//")) {
@@ -43,7 +42,7 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
         }
     }
 
-    const std::string text(link);
+    const std::string text(input);
     const auto filtered = DeepLinks::_normalizeAndFilterDeepLinks({{"App", {text}}, {"Other", {text}}}, {}, {"app"});
     check(filtered.submission.at("other") == std::set<std::string>{"other"});
     check(filtered.submission.contains("app") == (filtered.urls == 1));
@@ -53,5 +52,4 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
         check(DeepLinks::_normalizeAndFilterDeepLinks({{"app", {text}}}, {recorded}, {"app"}).whitelistedButDenied ==
               1);
     }
-    return 0;
 }

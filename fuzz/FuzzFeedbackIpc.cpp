@@ -75,12 +75,12 @@ constexpr std::size_t kTooDeep = 24;
 
 /// Events that a client reports, as a JSON array of records, with bytes and dates as `fuzz::enriched` has them. What
 /// the daemon takes is in a session's file, as it came, and makes an upload.
-int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
+void runInput(std::string_view input)
 {
-    const auto json = platform::parseJson(textOf(data, size));
-    if (!json || !json->asArray()) return 0;
+    const auto json = platform::parseJson(input);
+    if (!json || !json->asArray()) return;
     const Value events = fuzz::arriving(fuzz::enriched(*json));
-    if (fuzz::depthOf(events) > kTooDeep) return 0;
+    if (fuzz::depthOf(events) > kTooDeep) return;
     static Device& device = *new Device(); // as long as the process
 
     std::vector<std::string> expected; // archives of what goes into sessions
@@ -112,5 +112,4 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
     device.daemon->assembly.crowdsourcingFeedbackFlusher->flushToWireSync();
     device.drain();
     fuzz::checkBooks(device.daemon->assembly.feedbackBooks);
-    return 0;
 }

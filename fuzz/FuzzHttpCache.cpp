@@ -92,9 +92,8 @@ void use(const fs::path& directory)
 
 /// The input is a service's header fields, line by line, and a whole index. If it begins with "~" it is changes to a
 /// sound index: the offset in two bytes, and the byte's new value.
-int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
+void runInput(std::string_view input)
 {
-    const std::string_view input = textOf(data, size);
     const test::TemporaryDirectory directory;
     std::string index(input);
     if (input.starts_with("~")) {
@@ -107,14 +106,14 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
         }
         std::ifstream file(directory / "index.db", std::ios::binary);
         index.assign(std::istreambuf_iterator<char>(file), {});
-        for (std::size_t i = 1; i + 3 <= size; i += 3)
-            index[(data[i] << 8 | data[i + 1]) % index.size()] = input[i + 2];
+        const auto byte = [&](std::size_t at) { return std::size_t{static_cast<unsigned char>(input[at])}; };
+        for (std::size_t i = 1; i + 3 <= input.size(); i += 3)
+            index[(byte(i) << 8 | byte(i + 1)) % index.size()] = input[i + 2];
     } else {
         HttpHeaders headers;
         std::string_view rest = input;
         while (!rest.empty()) {
-            const std::string_view line = rest.substr(0, rest.find('\n'));
-            rest.remove_prefix(std::min(rest.size(), line.size() + 1));
+            const std::string_view line = takeLine(rest);
             const auto colon = line.find(':');
             // As the loader hands them on, without NUL.
             if (colon != std::string_view::npos && !line.contains('\0'))
@@ -124,5 +123,4 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
     }
     test::writeFile(directory / "index.db", index);
     use(directory.path);
-    return 0;
 }

@@ -6,15 +6,13 @@
 
 /// The input is the text around a word, and from the second line on a lookup's answer. Filtering drops results, in
 /// order, and changes nothing else; once filtered it stays as it is.
-int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
+void runInput(std::string_view input)
 {
     platform::Log::threshold = platform::LogLevel::Fault;
-    const std::string_view text = textOf(data, size);
-    const std::size_t line = std::min(text.find('\n'), text.size());
-    auto response = platform::parseJson(text.substr(std::min(line + 1, text.size())));
-    if (!response) return 0;
     tavrin::TAVLookupRequest request;
-    request.queryContext = std::string(text.substr(0, line));
+    request.queryContext = std::string(takeLine(input));
+    auto response = platform::parseJson(input);
+    if (!response) return;
 
     const platform::Value before = *response;
     tavrin::Lookup::filterLookupResultsWithRequest(request, *response, "de_CH");
@@ -28,5 +26,4 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
     const platform::Value once = *response;
     tavrin::Lookup::filterLookupResultsWithRequest(request, *response, "de_CH");
     check(*response == once);
-    return 0;
 }

@@ -40,17 +40,17 @@ bool mayBeRefused(const Value& value)
 } // namespace
 
 /// What is read can be written, unless it holds what the writer is known to refuse, and from then on nothing changes.
-int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
+void runInput(std::string_view input)
 {
-    const auto value = parsePropertyList(textOf(data, size));
+    const auto value = parsePropertyList(input);
     if (!value) {
         check(value.error().code == kFormatMalformed && !value.error().reason().empty());
-        return 0;
+        return;
     }
     const auto written = toPropertyList(*value);
     if (!written) {
         check(fuzz::anyOf(*value, mayBeRefused), written.error().reason());
-        return 0;
+        return;
     }
     const auto again = parsePropertyList(*written);
     check(again.has_value(), again ? "" : again.error().reason());
@@ -58,5 +58,4 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
 
     const auto third = parsePropertyList(toPropertyList(*again).value());
     check(third && fuzz::equalBy(*again, *third, same), toJson(*again));
-    return 0;
 }

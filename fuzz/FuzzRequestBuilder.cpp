@@ -9,16 +9,10 @@ using namespace platform;
 
 /// The input is a URL, and below it lines "f name=value" or "d name=value" that are forced and defaulted. The request's
 /// query is sorted, has each name once with the value that counts, and no ";"; made again it is the same.
-int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
+void runInput(std::string_view input)
 {
-    std::string_view rest = textOf(data, size);
-    const auto line = [&rest] {
-        const std::string_view first = rest.substr(0, rest.find('\n'));
-        rest.remove_prefix(std::min(first.size() + 1, rest.size()));
-        return first;
-    };
-    const auto url = Url::parse(line());
-    if (!url) return 0;
+    const auto url = Url::parse(takeLine(input));
+    if (!url) return;
 
     auto builder = tavrin::TavrinURLRequestBuilder::requestBuilderWithURL(*url);
     std::vector<QueryItem> expected; // each name once, the last forced value
@@ -30,8 +24,8 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
             found->value = item.value;
     };
     for (const QueryItem& item : UrlComponents(*url).queryItems()) expect(item, true);
-    while (!rest.empty()) {
-        const std::string_view text = line();
+    while (!input.empty()) {
+        const std::string_view text = takeLine(input);
         if (text.size() < 3) continue; // an item without name and value is nothing
         const std::string_view pair = text.substr(2);
         const auto equals = pair.find('=');
@@ -55,5 +49,4 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
               items, expected,
               [](const QueryItem& a, const QueryItem& b) { return a.name == b.name && a.value == b.value; }),
           made.string());
-    return 0;
 }

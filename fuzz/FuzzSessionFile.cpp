@@ -1,8 +1,4 @@
-#include <array>
-#include <bit>
-
 #include "fuzz/Sessions.h"
-#include "platform/base/Log.h"
 #include "platform/files/Counters.h"
 #include "platform/run/Transactions.h"
 #include "platform/values/Archive.h"
@@ -11,32 +7,26 @@
 #include "tavrind/FileContainer.h"
 #include "tavrind/TavrinDiagnosticDataReporter.h"
 #include "tavrind/TavrinFeedback.h"
-#include "tests/support/ManualClock.h"
-#include "tests/support/ManualExecutor.h"
+#include "tests/support/ByHand.h"
+#include "tests/support/Encodings.h"
 #include "tests/support/MemoryFiles.h"
 
 using namespace tavrin;
+using platform::test::framed;
 
 namespace {
 
 constexpr const char* kFile = "/session.1";
 
-std::string framed(std::string_view archive)
-{
-    const auto length = std::bit_cast<std::array<char, 8>>(std::uint64_t{archive.size()});
-    return std::string(length.data(), length.size()).append(archive);
-}
-
 /// Reads a file that an earlier process left, as it is found, and checks what is made of it.
 void readFile(std::string contents)
 {
-    platform::test::ManualExecutor executor;
-    platform::test::ManualClock clock;
+    platform::test::ByHand thread;
     platform::test::MemoryFiles files;
     platform::Transactions transactions;
     platform::CounterStore counters;
     TavrinDiagnosticDataReporter diagnosticData(counters);
-    const auto queue = platform::Queue::make("storage", platform::Queue::Kind::Serial, executor, clock);
+    const auto queue = thread.makeQueue("storage");
     const auto store = std::make_shared<const FileContainerStore>(
         FileContainerStore{files, transactions, diagnosticData, queue, "tavrind/1", 4u << 20});
 
@@ -54,12 +44,9 @@ void readFile(std::string contents)
 } // namespace
 
 /// The input is a session file; and it is what a file has behind its head, as the archive of one event.
-int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
+void runInput(std::string_view input)
 {
-    platform::Log::threshold = platform::LogLevel::Fault;
-    const std::string_view input = textOf(data, size);
     readFile(std::string(input));
     readFile(framed(platform::archiveValue("tavrind/1")) + framed(platform::archive(ClientSessionHeader())) +
              framed(input));
-    return 0;
 }
