@@ -4,8 +4,8 @@
 #include <mutex>
 #include <shared_mutex>
 
-/// Clang checks these attributes (-Wthread-safety); other compilers skip them. A member that is GUARDED_BY a mutex is
-/// only touched while the thread holds that, and a function that REQUIRES it is only called then.
+/// Clang checks these attributes (-Wthread-safety); other compilers ignore them. A thread must hold the mutex while it
+/// uses a member that is GUARDED_BY it, and when it calls a function that REQUIRES it.
 #ifdef __clang__
 #define THREAD_SAFETY(...) __attribute__((__VA_ARGS__))
 #else
@@ -17,8 +17,8 @@
 
 namespace platform {
 
-/// A lock for the few states that no queue guards. Held for a few lines: nothing is waited for, and no callback is run,
-/// under it. Not recursive.
+/// A lock for the little state that no queue guards. A thread holds it for a few lines, in which it neither blocks nor
+/// runs a callback. Not recursive.
 class THREAD_SAFETY(capability("mutex")) Mutex {
 public:
     Mutex() = default;
@@ -33,7 +33,7 @@ private:
     std::mutex _mutex;
 };
 
-/// A Mutex that one writer or several readers hold.
+/// A Mutex that one writer or several readers can hold.
 class THREAD_SAFETY(capability("mutex")) SharedMutex {
 public:
     SharedMutex() = default;
@@ -49,7 +49,7 @@ private:
     std::shared_mutex _mutex;
 };
 
-/// Holds a mutex as its only owner for as long as this lives.
+/// Holds a mutex exclusively from its construction to its destruction.
 template <class M = Mutex> class THREAD_SAFETY(scoped_lockable) MutexLock {
 public:
     explicit MutexLock(M& mutex) THREAD_SAFETY(acquire_capability(mutex)) : _mutex(mutex) { _mutex.lock(); }
@@ -61,7 +61,7 @@ private:
     M& _mutex;
 };
 
-/// Holds a mutex as one of its readers for as long as this lives.
+/// Holds a mutex as a reader from its construction to its destruction.
 class THREAD_SAFETY(scoped_lockable) SharedMutexLock {
 public:
     explicit SharedMutexLock(SharedMutex& mutex) THREAD_SAFETY(acquire_shared_capability(mutex)) : _mutex(mutex)
@@ -76,8 +76,8 @@ private:
     SharedMutex& _mutex;
 };
 
-/// Lets a thread that holds a mutex wait for a state that the mutex guards. wait() may return without a notification:
-/// the caller looks at the state in a loop.
+/// A condition variable for state that a mutex guards. wait() may return without a notification: call it in a loop that
+/// checks the state.
 class Condition {
 public:
     void wait(Mutex& mutex) REQUIRES(mutex)

@@ -70,7 +70,7 @@ struct CounterStore::Impl : std::enable_shared_from_this<Impl> {
         changed();
     }
 
-    /// Returns false if there is no such counter.
+    /// Calls `change` with the value of an existing counter; returns false if the counter is missing.
     template <class Change> [[nodiscard]] bool withExisting(std::string_view key, Change& change)
     {
         SharedMutexLock lock(mutex);

@@ -8,8 +8,7 @@
 
 namespace platform {
 
-/// Compares as field names, content codings and directives compare: letters of ASCII regardless of case (RFC
-/// 9110, 5.1).
+/// Compares field names, content codings or directives: ignores the case of ASCII letters (RFC 9110, 5.1). Any thread.
 [[nodiscard]] bool equalIgnoringCase(std::string_view a, std::string_view b);
 
 /// Header fields in order. Names are compared case-insensitively (RFC 9110, 5.1). A plain value.
