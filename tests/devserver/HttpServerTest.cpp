@@ -74,7 +74,7 @@ TEST_F(HttpServerTest, BodiesAreCutPaddedOrGoOn)
         {"/cut", "01234"},
         {"/padded", "0123456789" + std::string(199'990, ' ')},
         {"/cut-padded", "0123456789" + std::string(99'990, ' ')},
-        {"/on", "a\r\n0123456789\r\n1\r\n \r\n1\r\n \r\n"}, // no last chunk
+        {"/on", "A\r\n0123456789\r\n1\r\n \r\n1\r\n \r\n"}, // no last chunk
     };
     for (const auto& [path, body] : cases) {
         const std::string answer =
