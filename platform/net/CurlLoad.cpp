@@ -2,6 +2,8 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <netdb.h>
+#include <sys/socket.h>
 #include <sys/stat.h>
 #include <unistd.h>
 #include <utility>
@@ -74,7 +76,7 @@ bool CurlLoad::prepare(CURL* easy)
     }
     _easy = easy;
     _marks.hop = monotonicSeconds();
-    _sent = _anyHeader = _headersEnded = false;
+    _sent = _anyHeader = _headersEnded = _ledInside = false;
     _headers = {};
     _uploaded = 0;
     curl_slist_free_all(std::exchange(_headerList, nullptr));
@@ -132,6 +134,11 @@ void CurlLoad::setOptions()
     set(
         CURLOPT_HEADERFUNCTION, +[](char* data, std::size_t, std::size_t count, void* self) {
             return static_cast<CurlLoad*>(self)->receivedHeader({data, count});
+        });
+    set(CURLOPT_OPENSOCKETDATA, this);
+    set(
+        CURLOPT_OPENSOCKETFUNCTION, +[](void* self, curlsocktype, curl_sockaddr* address) {
+            return static_cast<CurlLoad*>(self)->openSocket(*address);
         });
     set(CURLOPT_PREREQDATA, this);
     set(
@@ -199,14 +206,30 @@ std::size_t CurlLoad::readUpload(char* buffer, std::size_t size)
     return static_cast<std::size_t>(count);
 }
 
-/// Aborts if a public host led to an address that isn't public, by a redirect or a URL in a response.
+/// Returns false if a public host led to an address that isn't public, by a redirect or a URL in a response.
+bool CurlLoad::mayReach(const char* address)
+{
+    const bool forbidden = _hop.source && _hop.source->isPublic && !isPublicAddress(address);
+    _ledInside = _ledInside || forbidden;
+    return !forbidden;
+}
+
+/// Refuses a forbidden address before any packet is sent to it. libcurl then tries the host's next address.
+curl_socket_t CurlLoad::openSocket(const curl_sockaddr& address)
+{
+    std::array<char, NI_MAXHOST> text{};
+    getnameinfo(&address.addr, static_cast<socklen_t>(address.addrlen), text.data(), text.size(), nullptr, 0,
+                NI_NUMERICHOST);
+    return mayReach(text.data()) ? socket(address.family, address.socktype | SOCK_CLOEXEC, address.protocol)
+                                 : CURL_SOCKET_BAD;
+}
+
+/// Runs before the request is sent, also on a connection that an earlier load opened.
 int CurlLoad::mayConnect(const char* address)
 {
     _sent = true;
     _publicPeer = isPublicAddress(address);
-    if (!_hop.source || !_hop.source->isPublic || _publicPeer) return CURL_PREREQFUNC_OK;
-    _error = urlError(kUrlForbiddenRedirect, "led to an address that isn't public");
-    return CURL_PREREQFUNC_ABORT;
+    return mayReach(address) ? CURL_PREREQFUNC_OK : CURL_PREREQFUNC_ABORT;
 }
 
 // ---- receiving ----
@@ -360,6 +383,8 @@ std::optional<Error> CurlLoad::errorOf(CURLcode code) const
     // A final status completes an upload, even if the connection or the rest of the body fails after it.
     if (hasUpload() && !_files->download && isFinal() && (!_error || _error->code == kUrlTimedOut)) return std::nullopt;
     if (_error) return _error;
+    if (_ledInside && (code == CURLE_COULDNT_CONNECT || code == CURLE_ABORTED_BY_CALLBACK))
+        return urlError(kUrlForbiddenRedirect, "led to an address that isn't public");
     // libcurl uses this code also for a response that isn't HTTP.
     if (code == CURLE_UNSUPPORTED_PROTOCOL && _sent)
         return urlError(kUrlBadResponse, fmt::format("the response isn't HTTP: {}", _errorText.data()));

@@ -71,7 +71,9 @@ private:
     bool store(std::string_view bytes);
     std::size_t receivedHeader(std::string_view line);
     std::size_t readUpload(char* buffer, std::size_t size);
-    int mayConnect(const char* address);
+    [[nodiscard]] bool mayReach(const char* address);
+    [[nodiscard]] curl_socket_t openSocket(const curl_sockaddr& address);
+    [[nodiscard]] int mayConnect(const char* address);
 
     const UrlRequest& _request;
     const UrlSessionConfiguration& _configuration;
@@ -96,6 +98,7 @@ private:
     bool _anyHeader = false;
     bool _headersEnded = false; // later header lines are trailers
     bool _publicPeer = false;
+    bool _ledInside = false; // an address was refused
     HttpHeaders _headers;
     ContentDecoder _decoder;
     std::string _body;
