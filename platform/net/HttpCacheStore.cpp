@@ -36,8 +36,8 @@ constexpr std::array kSchema{
     " used INTEGER NOT NULL)",
     "CREATE INDEX entryByUse ON entry (used)",
     "CREATE TABLE answer (id INTEGER PRIMARY KEY, status INTEGER NOT NULL, url TEXT NOT NULL, headers TEXT NOT NULL,"
-    " selecting TEXT NOT NULL, requested INTEGER NOT NULL, received INTEGER NOT NULL, bodySize INTEGER NOT NULL,"
-    " xxh3 INTEGER NOT NULL, body TEXT)"};
+    " selecting TEXT NOT NULL, requested INTEGER NOT NULL, received INTEGER NOT NULL, public INTEGER NOT NULL,"
+    " bodySize INTEGER NOT NULL, xxh3 INTEGER NOT NULL, body TEXT)"};
 
 /// Returns header fields as lines. Leaves out a field that contains a line end, which can't have arrived by HTTP.
 std::string linesOf(const HttpHeaders& headers)
@@ -100,13 +100,17 @@ struct HttpCacheStore::Row {
     std::string selecting;
     std::int64_t requested = 0;
     std::int64_t received = 0;
+    std::int64_t publicPeer = kUnknown;
     std::int64_t bodySize = 0;
     std::int64_t digest = 0;
     std::optional<std::string> body;
 
+    /// In the column "public", beside 0 and 1.
+    static constexpr std::int64_t kUnknown = -1;
+
     [[nodiscard]] std::int64_t digestWith(const std::string& key, std::string_view bytes) const
     {
-        const std::array numbers{status, requested, received};
+        const std::array numbers{status, requested, received, publicPeer};
         std::uint64_t digest =
             digestOf({reinterpret_cast<const char*>(numbers.data()), sizeof numbers}, numbers.size());
         for (const std::string_view text : {std::string_view(key), std::string_view(url), std::string_view(headers),
@@ -205,8 +209,8 @@ Result<std::shared_ptr<const StoredResponse>> HttpCacheStore::find(const std::st
 {
     std::optional<Row> row;
     auto read =
-        _index->run("SELECT answer.id, status, url, headers, selecting, requested, received, bodySize, xxh3, body"
-                    " FROM entry JOIN answer ON answer.id = entry.id WHERE key = ?",
+        _index->run("SELECT answer.id, status, url, headers, selecting, requested, received, public, bodySize, xxh3,"
+                    " body FROM entry JOIN answer ON answer.id = entry.id WHERE key = ?",
                     {std::string_view(key)}, [&](const Sqlite::Row& found) {
                         const auto text = [&](int column) { return std::string(found.text(column)); };
                         row = Row{.id = found.integer(0),
@@ -216,9 +220,10 @@ Result<std::shared_ptr<const StoredResponse>> HttpCacheStore::find(const std::st
                                   .selecting = text(4),
                                   .requested = found.integer(5),
                                   .received = found.integer(6),
-                                  .bodySize = found.integer(7),
-                                  .digest = found.integer(8)};
-                        if (!found.isNull(9)) row->body = text(9);
+                                  .publicPeer = found.integer(7),
+                                  .bodySize = found.integer(8),
+                                  .digest = found.integer(9)};
+                        if (!found.isNull(10)) row->body = text(10);
                     });
     if (!read) {
         // SQLite reports this for a truncated file.
@@ -240,6 +245,7 @@ Result<std::shared_ptr<const StoredResponse>> HttpCacheStore::find(const std::st
     auto stored = std::make_shared<StoredResponse>();
     stored->response = {
         .url = std::move(*url), .statusCode = static_cast<int>(row->status), .headers = headersOf(row->headers)};
+    if (row->publicPeer != Row::kUnknown) stored->response.publicPeer = row->publicPeer != 0;
     stored->body = std::move(*body);
     stored->selecting = std::move(row->selecting);
     stored->requested = Date(Duration(row->requested));
@@ -257,6 +263,7 @@ Result<std::vector<std::string>> HttpCacheStore::put(const std::string& key, con
             .selecting = stored.selecting,
             .requested = countOf(stored.requested),
             .received = countOf(stored.received),
+            .publicPeer = stored.response.publicPeer ? std::int64_t{*stored.response.publicPeer} : Row::kUnknown,
             .bodySize = static_cast<std::int64_t>(body.size())};
     row.digest = row.digestWith(key, body);
     const std::uint64_t size =
@@ -291,10 +298,10 @@ Result<std::vector<std::string>> HttpCacheStore::put(const std::string& key, con
         row.id = _index->lastInsertedRow();
         if (asFile)
             if (auto written = _files.writeUnsynced(bodyPath(row.id), body); !written) return written;
-        return _index->run("INSERT INTO answer VALUES (?, ?, ?, ?, ?, ?, ?, ?, ?, ?)",
+        return _index->run("INSERT INTO answer VALUES (?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?)",
                            {row.id, row.status, std::string_view(row.url), std::string_view(row.headers),
-                            std::string_view(row.selecting), row.requested, row.received, row.bodySize, row.digest,
-                            asFile ? Sqlite::Parameter() : Sqlite::Parameter(body)});
+                            std::string_view(row.selecting), row.requested, row.received, row.publicPeer, row.bodySize,
+                            row.digest, asFile ? Sqlite::Parameter() : Sqlite::Parameter(body)});
     });
     if (!done) {
         if (row.id != 0) removeBody(row.id);

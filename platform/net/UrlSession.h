@@ -58,7 +58,7 @@ struct UrlResponse {
     bool isHttp = true;
     int statusCode = 0;
     HttpHeaders headers;
-    /// True if any host of the redirect chain had a public address; nullopt if unknown (a response read from disk).
+    /// True if any host of the redirect chain had a public address; nullopt if unknown.
     std::optional<bool> publicPeer = std::nullopt;
 };
 

@@ -100,6 +100,11 @@ TEST_F(HttpCacheTest, AnswersAreFoundWholeAtOnceAndAfterARestart)
     EXPECT_EQ(found->response.url, url(2));
     EXPECT_EQ(found->response.headers, headers);
     EXPECT_EQ(find(1), kSmall);
+    for (const std::optional<bool> publicPeer : {std::optional<bool>(), {true}, {false}}) {
+        cache->store(url(9), {.url = url(9), .statusCode = 200, .publicPeer = publicPeer}, Bytes(kSmall));
+        open();
+        EXPECT_EQ(cache->find(url(9)).value().response.publicPeer, publicPeer);
+    }
 
     store(2, "replaced");
     EXPECT_EQ(find(2), "replaced");
