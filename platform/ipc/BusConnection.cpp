@@ -396,31 +396,42 @@ void BusConnection::receive(sd_bus_message* message, const Member& member)
     hold(_bytesInFlight, _bytesInFlight + size);
     _calls.emplace(id, PendingCall{&member, size, BusMessage(sd_bus_message_ref(message))});
 
-    // The task creates the responder: a task that never runs owes no reply.
     _queue->async([self = shared_from_this(), handler = _handler, id, name = member.name,
                    arguments = std::move(decoded->message)]() mutable {
-        RunLoop& loop = self->_context->loop;
-        if (self->_silenced) return;
-        Responder responder(
-            [self, id, &loop](CallResult result) {
-                loop.execute(Priority::Default,
-                             [self, id, result = std::move(result)]() mutable { self->answer(id, std::move(result)); });
-            },
-            [self, id, &loop] { loop.execute(Priority::Default, [self, id] { self->forget(id); }); });
-        (*handler)(name, std::move(arguments), std::move(responder));
+        ReplyBacklog& backlog = self->_context->backlog;
+        backlog.runWithRoom([self, handler = std::move(handler), id, name, arguments = std::move(arguments)]() mutable {
+            self->callHandler(*handler, name, std::move(arguments), id);
+        });
     });
+}
+
+/// Calls the handler, on the queue. Creates the responder: a call that is never handled owes no reply.
+void BusConnection::callHandler(const Handler& handler, std::string_view member, Message arguments, std::uint64_t id)
+{
+    if (_silenced) return;
+    Responder responder(
+        [self = shared_from_this(), id](CallResult result) {
+            const std::size_t size = result ? memoryOf(*result) : result.error().message.size();
+            self->_context->backlog.add(size);
+            self->_context->loop.execute(Priority::Default, [self, id, size, result = std::move(result)]() mutable {
+                self->answer(id, std::move(result), size);
+                self->_context->backlog.remove(size);
+            });
+        },
+        [self = shared_from_this(), id] {
+            self->_context->loop.execute(Priority::Default, [self, id] { self->forget(id); });
+        });
+    handler(member, std::move(arguments), std::move(responder));
 }
 
 // MARK: - writing
 
-void BusConnection::answer(std::uint64_t id, CallResult result)
+void BusConnection::answer(std::uint64_t id, CallResult result, std::size_t size)
 {
     const auto call = _calls.find(id);
     if (call == _calls.end()) return;
-    if (sd_bus_message_get_expect_reply(call->second.message.get()) > 0) {
-        std::size_t size = 0;
-        if (BusMessage answer = encodeAnswer(call->second, std::move(result), size)) send(answer.get(), size);
-    }
+    if (sd_bus_message_get_expect_reply(call->second.message.get()) > 0)
+        if (BusMessage answer = encodeAnswer(call->second, std::move(result))) send(answer.get(), size);
     forget(id);
 }
 
@@ -443,21 +454,17 @@ void BusConnection::dropCalls()
     hold(_bytesInFlight, 0);
 }
 
-BusMessage BusConnection::encodeAnswer(const PendingCall& call, CallResult result, std::size_t& size) const
+BusMessage BusConnection::encodeAnswer(const PendingCall& call, CallResult result) const
 {
     if (result) {
         sd_bus_message* answer = nullptr;
         if (sd_bus_message_new_method_return(call.message.get(), &answer) < 0) return {};
         BusMessage owned(answer);
-        auto encoded = encodeArguments(answer, call.member->out, *result);
-        if (encoded) {
-            size = *encoded;
-            return owned;
-        }
+        const auto encoded = encodeArguments(answer, call.member->out, *result);
+        if (encoded) return owned;
         kLog.fault("the reply to {} can't be sent: {}", call.member->name, encoded.error());
         result = std::unexpected(CallError{SD_BUS_ERROR_FAILED, "the reply can't be sent: " + encoded.error()});
     }
-    size = result.error().message.size();
     return makeErrorAnswer(call.message.get(), result.error());
 }
 

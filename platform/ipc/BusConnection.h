@@ -13,6 +13,7 @@
 #include "platform/ipc/BusInput.h"
 #include "platform/ipc/BusMessage.h"
 #include "platform/ipc/Ipc.h"
+#include "platform/ipc/ReplyBacklog.h"
 #include "platform/run/Clock.h"
 #include "platform/run/RunLoop.h"
 
@@ -48,6 +49,7 @@ struct BusContext {
     std::size_t held = 0;                                   ///< bytes of all processes
     std::size_t unread = 0;                                 ///< the part of `held` that peers have not read
     bool starved = false;                                   ///< a connection waits for bytes to be freed
+    ReplyBacklog backlog{limits.unsentBytes};               ///< any thread
 };
 
 /// The loop's side of one server connection: an sd-bus object, its pending calls and its unwritten output.
@@ -56,7 +58,7 @@ struct BusContext {
 ///     answer: any thread → loop: answer (encode) → sd-bus → [its write queue] → socket
 ///
 /// States: Waiting until `start`; Open; Draining after `invalidate` until queued output is written; Closed. The context
-/// owns the connection until Closed. Loop's thread, except for `handle`.
+/// owns the connection until Closed. Loop's thread, except for `handle` and `callHandler`.
 class BusConnection final : public std::enable_shared_from_this<BusConnection> {
 public:
     /// Takes ownership of a connected socket. `closed` runs once, on the loop.
@@ -104,13 +106,14 @@ private:
     int onMessage(sd_bus_message* message);
     void takeMessage(sd_bus_message* message);
     void receive(sd_bus_message* message, const Member& member);
+    void callHandler(const Handler& handler, std::string_view member, Message arguments, std::uint64_t id);
     void hold(std::size_t& part, std::size_t bytes);
 
     // writing
-    void answer(std::uint64_t id, CallResult result);
+    void answer(std::uint64_t id, CallResult result, std::size_t size);
     void forget(std::uint64_t id);
     void dropCalls();
-    [[nodiscard]] BusMessage encodeAnswer(const PendingCall& call, CallResult result, std::size_t& size) const;
+    [[nodiscard]] BusMessage encodeAnswer(const PendingCall& call, CallResult result) const;
     void send(sd_bus_message* message, std::size_t size);
     void settleWriteQueue(std::size_t sizeOfNewest);
     void setUnwritten(std::size_t bytes);

@@ -61,7 +61,7 @@ struct Interface {
 /// not affected.
 ///
 /// Bytes count received messages, the values decoded from them, and messages that a peer has not read yet. Together the
-/// limits bound the memory that all peers can make the service use.
+/// limits bound the memory that all peers can make the service use. An unread file handle counts as 16 KiB.
 struct Limits {
     /// Bytes of one incoming message with its header. A peer that announces a larger one is disconnected. Decoded
     /// values may take twice as much; a call beyond that gets the error LimitsExceeded.
@@ -77,6 +77,8 @@ struct Limits {
     std::size_t bytes = 30u << 20;
     /// Unread bytes of all peers. Beyond it the connection with the most unread bytes is closed.
     std::size_t unreadBytes = 18u << 20;
+    /// Bytes of replies that handlers gave and that are not encoded yet. Beyond it no handler is called.
+    std::size_t unsentBytes = 8u << 20;
     /// Open connections of one process over all listeners; further ones are closed.
     unsigned connectionsPerProcess = 512;
     /// Open connections of one listener; further ones wait to be accepted until one closes.

@@ -1,0 +1,92 @@
+#include "platform/ipc/ReplyBacklog.h"
+
+#include <latch>
+#include <sys/mman.h>
+
+#include <gmock/gmock.h>
+
+#include "platform/values/Dictionary.h"
+#include "tests/support/ManualClock.h"
+#include "tests/support/ManualExecutor.h"
+#include "tests/support/ProbeService.h"
+
+namespace platform::ipc {
+namespace {
+
+using namespace platform::ipc::test;
+using platform::test::ManualExecutor;
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+TEST(ReplyBacklog, HoldsHandlersBackUntilThereIsRoom)
+{
+    ManualClock clock;
+    ManualExecutor executor;
+    ReplyBacklog backlog(100);
+    std::vector<std::string> ran;
+    const auto call = [&](const std::shared_ptr<Queue>& queue, const char* name, std::size_t answer) {
+        queue->async([&, name, answer] {
+            backlog.runWithRoom([&, name, answer] {
+                ran.emplace_back(name);
+                backlog.add(answer);
+            });
+        });
+    };
+    const auto newRuns = [&] {
+        executor.drain();
+        return std::exchange(ran, {});
+    };
+    std::vector<std::shared_ptr<Queue>> queues;
+    for (int i = 0; i < 4; ++i) queues.push_back(Queue::make("test", Queue::Kind::Serial, executor, clock));
+
+    call(queues[0], "first", 60);
+    call(queues[0], "second", 60);
+    call(queues[1], "no reply yet", 0);
+    call(queues[1], "later", 0);
+    call(queues[2], "large", 1000);
+    call(queues[3], "last", 0);
+    EXPECT_THAT(newRuns(), ElementsAre("first", "second")) << "120 bytes wait";
+    backlog.remove(10);
+    EXPECT_THAT(newRuns(), IsEmpty());
+    backlog.remove(50);
+    EXPECT_THAT(newRuns(), ElementsAre("no reply yet", "later", "large")) << "one wakes the next while there is room";
+    backlog.remove(1000);
+    EXPECT_THAT(newRuns(), ElementsAre("last"));
+}
+
+TEST(ReplyBacklog, NoHandlerIsCalledWhileLargeRepliesAreUnsent)
+{
+    Service service({.unsentBytes = 1000});
+    auto client = service.connect();
+    // The loop is busy from the reply to the first call, until neither worker is with the second one.
+    service.beforeGiving = [&] {
+        service.loop.execute(Priority::Default, [&] {
+            const auto workers = std::make_shared<std::latch>(3);
+            for (int i = 0; i < 2; ++i)
+                service.pool.execute(Priority::Default, [workers] { workers->arrive_and_wait(); });
+            workers->arrive_and_wait();
+            std::lock_guard lock(service.mutex);
+            EXPECT_THAT(service.notes, IsEmpty());
+        });
+    };
+    std::promise<void> written;
+    service.loop.execute(Priority::Default, [&, both = written.get_future().share()] { both.wait(); });
+    int answered = 0;
+    const auto count = [&](const CallResult& result) { answered += result.has_value(); };
+    client->call(probe().name, method("Give"), {{1000}, {}}, count);
+    client->call(probe().name, method("Note"), {{"second"}, {}}, count);
+    written.set_value();
+    EXPECT_TRUE(client->wait([&] { return answered == 2; }, kLong));
+}
+
+TEST(ReplyBacklog, CountsWhatAMessageHolds)
+{
+    Message message{
+        {Value::Array{std::string(1000, 'x'), Value::dictionaryOf({{"key", Bytes(std::string(2000, 'y'))}})}}, {}};
+    EXPECT_NEAR(static_cast<double>(memoryOf(message)), 3000, 300);
+    for (int i = 0; i < 10; ++i) message.handles.emplace_back(memfd_create("handle", MFD_CLOEXEC));
+    EXPECT_GT(memoryOf(message), 100'000u) << "a descriptor is worth more than its bytes";
+}
+
+} // namespace
+} // namespace platform::ipc
