@@ -88,16 +88,17 @@ bool versionPrecedes(std::string_view a, std::string_view b)
     return a.size() < b.size();
 }
 
-bool AnnouncedVersion::take(std::string_view version, std::uint64_t now)
+bool AnnouncedVersion::take(std::string_view version, std::string_view current, std::uint64_t now)
 {
-    if (versionPrecedes(_version, version)) {
-        _version = version;
+    const bool delivered = !versionPrecedes(current, _version);
+    if (delivered && versionPrecedes(_version, version)) {
         _interval = kFirstAnnouncementInterval;
     } else if (now < _due) {
         return false;
     } else {
         _interval = std::min(2 * _interval, kLongestAnnouncementInterval);
     }
+    _version = version;
     _due = now + static_cast<std::uint64_t>(_interval.count());
     return true;
 }
@@ -190,7 +191,7 @@ void TavrinBagController::forceFetchBag(const Value& announcement)
     const std::string version = platform::toJson(announced);
     if (_fetchInProgress || !versionPrecedes(bag->version(), version)) return;
     const std::uint64_t now = _assembly.device.clock.hostTicks();
-    if (_inMemoryBagCacheAccessQueue->barrierSync([&] { return _announced.take(version, now); }))
+    if (_inMemoryBagCacheAccessQueue->barrierSync([&] { return _announced.take(version, bag->version(), now); }))
         _fetchBagStateWithVersion(version);
 }
 

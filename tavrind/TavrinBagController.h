@@ -47,12 +47,13 @@ enum class BagStaleness { Fresh, Expired, NoUrl, UrlChanged };
 [[nodiscard]] bool versionPrecedes(std::string_view a, std::string_view b);
 
 /// Limits the fetches for a version that the service announces but does not deliver: the first one is immediate, the
-/// next ones follow at intervals that double from one minute to four hours. A higher version starts again. Not
-/// thread-safe.
+/// next ones follow at intervals that double from one minute to four hours. A higher version starts again only after
+/// the last one was delivered. Not thread-safe.
 class AnnouncedVersion {
 public:
-    /// Returns whether to fetch for `version` at `now`, in host ticks. If so, counts the fetch as done.
-    [[nodiscard]] bool take(std::string_view version, std::uint64_t now);
+    /// Returns whether to fetch for `version` at `now`, in host ticks, while the bag has version `current`. If so,
+    /// counts the fetch as done.
+    [[nodiscard]] bool take(std::string_view version, std::string_view current, std::uint64_t now);
 
 private:
     std::string _version;

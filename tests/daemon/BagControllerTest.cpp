@@ -46,18 +46,19 @@ TEST(BagVersion, ComparesNumbersAsNumbers)
 TEST(BagVersion, OneThatDoesNotComeIsAskedForLessAndLessOften)
 {
     AnnouncedVersion announced;
-    const auto at = [&](const char* version, std::chrono::minutes now) {
-        return announced.take(version, static_cast<std::uint64_t>(platform::Duration(now).count()));
+    const auto at = [&](const char* version, const char* current, std::chrono::minutes now) {
+        return announced.take(version, current, static_cast<std::uint64_t>(platform::Duration(now).count()));
     };
-    const std::tuple<const char*, int, bool> steps[]{
-        {"10", 0, true},  {"10", 0, false}, {"9", 0, false},    {"10", 1, true},    {"10", 2, false},
-        {"10", 3, true},  {"10", 6, false}, {"10", 7, true},    {"11", 7, true},    {"11", 7, false},
-        {"10", 7, false}, {"11", 8, true},  {"11", 1000, true}, {"11", 1003, false}};
-    for (const auto& [version, minute, fetched] : steps)
-        EXPECT_EQ(at(version, std::chrono::minutes(minute)), fetched) << version << " at " << minute;
-    for (int day = 1; day < 20; ++day) (void)at("11", day * 24h);
-    EXPECT_FALSE(at("11", 19 * 24h + 239min));
-    EXPECT_TRUE(at("11", 19 * 24h + 240min)) << "four hours at most";
+    const std::tuple<const char*, const char*, int, bool> steps[]{
+        {"10", "8", 0, true},   {"10", "8", 0, false},    {"9", "8", 0, false},      {"10", "8", 1, true},
+        {"10", "8", 2, false},  {"10", "8", 3, true},     {"10", "8", 6, false},     {"10", "8", 7, true},
+        {"11", "8", 7, false},  {"11", "10", 7, true},    {"11", "10", 7, false},    {"11", "10", 8, true},
+        {"12", "10", 8, false}, {"13", "10", 1000, true}, {"14", "10", 1003, false}, {"15", "10", 1004, true}};
+    for (const auto& [version, current, minute, fetched] : steps)
+        EXPECT_EQ(at(version, current, std::chrono::minutes(minute)), fetched) << version << " at " << minute;
+    for (int day = 1; day < 20; ++day) (void)at("15", "10", day * 24h);
+    EXPECT_FALSE(at("15", "10", 19 * 24h + 239min));
+    EXPECT_TRUE(at("15", "10", 19 * 24h + 240min)) << "four hours at most";
 }
 
 struct BagControllerTest : DaemonTest {
