@@ -20,6 +20,8 @@
 namespace platform {
 namespace {
 
+using namespace std::chrono_literals;
+
 /// A message bus of the test's own, in the system bus's place, and services on it whose properties the test sets.
 struct SystemBusTest : testing::Test {
     SystemBusTest()
@@ -29,6 +31,11 @@ struct SystemBusTest : testing::Test {
                         "<busconfig><type>session</type><listen>unix:path=" + (directory / "bus").string() +
                             "</listen><policy context=\"default\"><allow send_destination=\"*\"/><allow own=\"*\"/>"
                             "<allow user=\"*\"/><allow receive_sender=\"*\"/></policy></busconfig>");
+        startBus();
+        useBus("unix:path=" + (directory / "bus").string());
+    }
+    void startBus()
+    {
         int ready[2];
         EXPECT_EQ(pipe(ready), 0);
         const std::string configuration = "--config-file=" + (directory / "bus.conf").string();
@@ -40,15 +47,17 @@ struct SystemBusTest : testing::Test {
         char byte = 0;
         EXPECT_EQ(read(ready[0], &byte, 1), 1) << "dbus-daemon doesn't start";
         close(ready[0]);
-        useBus("unix:path=" + (directory / "bus").string());
+    }
+    void stopBus()
+    {
+        sd_bus_flush_close_unref(std::exchange(service, nullptr));
+        if (daemon <= 0) return;
+        kill(daemon, SIGTERM);
+        waitpid(std::exchange(daemon, 0), nullptr, 0);
     }
     ~SystemBusTest() override
     {
-        sd_bus_flush_close_unref(service);
-        if (daemon > 0) {
-            kill(daemon, SIGTERM);
-            waitpid(daemon, nullptr, 0);
-        }
+        stopBus();
         unsetenv("DBUS_SYSTEM_BUS_ADDRESS");
     }
     static void useBus(const std::string& address) { setenv("DBUS_SYSTEM_BUS_ADDRESS", address.c_str(), 1); }
@@ -61,6 +70,7 @@ struct SystemBusTest : testing::Test {
     }
 
     test::TemporaryDirectory directory;
+    test::ManualClock clock;
     pid_t daemon = 0;
     RunLoop loop;
     sd_bus* service = nullptr;
@@ -84,7 +94,7 @@ TEST_F(SystemBusTest, NetworkManagerIsFollowedAndMayGo)
     Network network{.metered = 1};
     serve(kName);
     sd_bus_add_object_vtable(service, nullptr, kPath, kName, kNetwork, &network);
-    const auto status = makeNetworkManagerStatus(loop);
+    const auto status = makeNetworkManagerStatus(loop, clock);
     EXPECT_EQ(status->current(), std::nullopt);
     const auto becomes = [&](const NetworkState& state) {
         return test::runUntil(loop, [&] { return status->current() == state; });
@@ -97,6 +107,21 @@ TEST_F(SystemBusTest, NetworkManagerIsFollowedAndMayGo)
     EXPECT_TRUE(becomes({})) << "without it, the network is taken as there";
     sd_bus_request_name(service, kName, 0);
     EXPECT_TRUE(becomes({.online = false})) << "back again";
+
+    stopBus();
+    EXPECT_TRUE(becomes({}));
+    const auto nextAttempt = [&](std::chrono::seconds delay) {
+        clock.advance(delay, [] {});
+        bool done = false;
+        loop.execute(Priority::Default, [&] { done = true; });
+        EXPECT_TRUE(test::runUntil(loop, [&] { return done; }));
+    };
+    nextAttempt(5s);
+    startBus();
+    serve(kName);
+    sd_bus_add_object_vtable(service, nullptr, kPath, kName, kNetwork, &network);
+    nextAttempt(10s);
+    EXPECT_TRUE(becomes({.online = false})) << "the bus has restarted";
 }
 
 TEST_F(SystemBusTest, WithoutABusOrServiceTheDeviceIsOnlineAndNobodyUsesIt)
@@ -104,7 +129,7 @@ TEST_F(SystemBusTest, WithoutABusOrServiceTheDeviceIsOnlineAndNobodyUsesIt)
     for (const std::string& address :
          {"unix:path=" + (directory / "bus").string(), std::string("unix:path=/nowhere")}) {
         useBus(address);
-        const auto status = makeNetworkManagerStatus(loop);
+        const auto status = makeNetworkManagerStatus(loop, clock);
         (void)status->current();
         EXPECT_TRUE(test::runUntil(loop, [&] { return status->current() == NetworkState(); })) << address;
         const auto use = makeSystemDeviceUse(loop, directory.path);
