@@ -185,6 +185,9 @@ void BackgroundActivitiesManager::taskDidComplete(const std::shared_ptr<platform
 
     const bool sent = response && response->statusCode == 200;
     _findUpload(*task);
+    // The upload session forgets the task when this function returns, so all must be on disk before that. The books
+    // come first: after a kill in between, the statistics lack the upload, but they never count it twice.
+    _assembly.feedbackBooks.settle(upload, sent ? FeedbackFate::Sent : FeedbackFate::NotSent, note.events);
     const std::int64_t count = _feedbackFlusher->getFeedbackCountForTask(*task);
     _feedbackFlusher->removeFeedbacksForTask(*task);
     _assembly.crowdsourcingFeedbackFlusher->removeFeedbacksForTask(*task);
@@ -194,9 +197,7 @@ void BackgroundActivitiesManager::taskDidComplete(const std::shared_ptr<platform
         log(kLogFlusher).fault("response error {}", response ? std::to_string(response->statusCode) : "none");
         _assembly.diagnosticData.addValue(count, "com.quorvane.tavrind.feedbacknotsent");
     }
-    // The upload session forgets the task when this function returns, so the counts must be on disk before that.
     _assembly.device.counters.synchronize();
-    _assembly.feedbackBooks.settle(upload, sent ? FeedbackFate::Sent : FeedbackFate::NotSent, note.events);
 }
 
 void BackgroundActivitiesManager::sessionDidFinishEvents()

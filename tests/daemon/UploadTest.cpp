@@ -502,8 +502,17 @@ TEST_F(UploadTest, TheEndOfAnUploadIsInTheBooksOnceItIsForgotten)
     allUploads().front()->respond(200); // what the daemon said of its bag
     device.drain();
     const std::int64_t before = booked(FeedbackFate::Sent);
+    const std::int64_t countedBefore = counter("feedbacksent");
+    device.files.fault = [&](std::string_view, const std::filesystem::path& path) {
+        if (path.filename() == "feedback-books.json") {
+            EXPECT_EQ(counter("feedbacksent"), countedBefore) << "what is counted first is counted again after a kill";
+        }
+        return 0;
+    };
     uploadOne()->respond(200);
     device.drain();
+    device.files.fault = {};
+    EXPECT_GT(counter("feedbacksent"), countedBefore);
     restart();
     EXPECT_TRUE(uploads().empty());
     EXPECT_EQ(booked(FeedbackFate::Sent) - before, 2);
