@@ -11,6 +11,7 @@
 #include "tavrind/ClientSessionManager.h"
 #include "tavrind/FeedbackBooks.h"
 #include "tavrind/FileContainer.h"
+#include "tavrind/mmap_file.h"
 #include "tavrind/TavrinLogging.h"
 
 namespace tavrin {
@@ -60,7 +61,9 @@ TavrinPersistentStorage::TavrinPersistentStorage(Assembly& assembly)
       _store(std::make_shared<FileContainerStore>(
           assembly.fileManager, assembly.device.transactions, assembly.diagnosticData, _queue,
           ClientSessionManager::tavrindUserAgent(),
-          static_cast<std::uint64_t>(limit(assembly.userDefaults, "TAVSessionSizeLimit", kDefaultMaxFileSize)))),
+          std::min<std::uint64_t>(
+              kLargestMappedFile,
+              static_cast<std::uint64_t>(limit(assembly.userDefaults, "TAVSessionSizeLimit", kDefaultMaxFileSize))))),
       _maxFileAge(limit(assembly.userDefaults, "TAVSessionMaxAge", kDefaultMaxFileAge))
 {
     _scanCacheDirectory();

@@ -7,9 +7,6 @@ namespace tavrin {
 
 namespace {
 
-/// In bytes: twice the largest resource, and many times the largest image or session.
-constexpr std::size_t kLargest = 64u << 20;
-
 /// Only files made by memfd_create have seals.
 bool isInMemory(const platform::FileHandle& file)
 {
@@ -23,9 +20,9 @@ platform::Result<platform::Bytes> mmapFileHandle(const platform::FileHandle& fil
     const auto info = platform::fileInfo(file);
     if (!info) return std::unexpected(info.error());
     if (info->size == 0) return std::unexpected(platform::Error::posix(EINVAL));
-    if (info->size > kLargest) return std::unexpected(platform::Error::posix(EFBIG));
+    if (info->size > kLargestMappedFile) return std::unexpected(platform::Error::posix(EFBIG));
     if (isInMemory(file)) return platform::mapFile(file, info->size);
-    auto contents = platform::readFile(file, kLargest);
+    auto contents = platform::readFile(file, kLargestMappedFile);
     if (contents && contents->size() < info->size) return std::unexpected(platform::Error::posix(EIO));
     return contents;
 }

@@ -5,9 +5,13 @@
 
 namespace tavrin {
 
+/// The largest file that `mmapFileHandle` returns, in bytes: twice the largest resource, and many times the largest
+/// image.
+inline constexpr std::size_t kLargestMappedFile = 64u << 20;
+
 /// Returns the bytes of a whole file, which stay valid after the handle is closed. Fails with the system's error
-/// ("POSIX"): EINVAL for an empty file, EFBIG for one of more than 64 MiB, EIO for one that was truncated during the
-/// call.
+/// ("POSIX"): EINVAL for an empty file, EFBIG for one beyond `kLargestMappedFile`, EIO for one that was truncated
+/// during the call.
 ///
 /// A nameless file in memory is mapped. Any other file is read, because another program may truncate it: reading a
 /// mapping beyond the end of its file kills the process (SIGBUS).

@@ -6,6 +6,7 @@
 #include "platform/values/Record.h"
 #include "tavrind/ArchivedDataIterator.h"
 #include "tavrind/ClientSessionHeader.h"
+#include "tavrind/mmap_file.h"
 #include "tavrind/OutputStream.h"
 #include "tavrind/StoredSession.h"
 #include "tavrind/TavrinFeedbackFlusher.h"
@@ -444,10 +445,12 @@ TEST_F(SessionFileTest, WhatStandsInTheWayIsLeftAlone)
 
 TEST_F(SessionFileTest, LimitsThatAreNoneAreTheUsualOnes)
 {
-    for (const Value& limit : {Value(0), Value(-5), Value("x"), Value(0.5)}) {
+    const std::pair<Value, std::uint64_t> limits[]{{0, 4'194'304},   {-5, 4'194'304}, {"x", 4'194'304},
+                                                   {0.5, 4'194'304}, {1000, 1000},    {1e12, kLargestMappedFile}};
+    for (const auto& [limit, size] : limits) {
         device.userDefaults.set("TAVSessionSizeLimit", limit);
         start();
-        EXPECT_EQ(storage()->store().maxFileSize, 4'194'304u) << platform::toJson(limit);
+        EXPECT_EQ(storage()->store().maxFileSize, size) << platform::toJson(limit);
     }
 }
 
