@@ -19,8 +19,6 @@ namespace {
 
 /// Bytes of header fields of one load, over all hops. libcurl refuses a single line beyond 100 KiB.
 constexpr std::size_t kMaximumHeaderSize = 256u << 10;
-/// Bytes of all incomplete bodies in memory.
-constexpr std::size_t kMaximumInMemory = 64u << 20;
 
 } // namespace
 
@@ -62,6 +60,11 @@ void CurlLoad::timeOut(TimePoint now)
     _error = now >= *_began + _configuration.totalTimeout
                  ? urlError(kUrlTimedOut, fmt::format("not whole after {:g} s", toSeconds(_configuration.totalTimeout)))
                  : urlError(kUrlTimedOut, fmt::format("nothing received for {:g} s", toSeconds(timeout())));
+}
+
+void CurlLoad::giveWay()
+{
+    _error = urlError(kUrlTooLarge, fmt::format("the largest, with {} bytes, of too many in all loads", _body.size()));
 }
 
 // ---- sending ----
@@ -285,10 +288,6 @@ bool CurlLoad::keep(std::string_view bytes)
     if (_files) {
         if (!store(bytes)) return false;
     } else {
-        if (_inMemory + bytes.size() > kMaximumInMemory) {
-            _error = urlError(kUrlTooLarge, fmt::format("more than {} bytes in all loads", kMaximumInMemory));
-            return false;
-        }
         if (_body.empty() && !_decoder.decodes()) {
             curl_off_t length = -1;
             curl_easy_getinfo(_easy, CURLINFO_CONTENT_LENGTH_DOWNLOAD_T, &length);

@@ -38,6 +38,10 @@ public:
     [[nodiscard]] bool goesOn(CURLcode code);
     /// Sets the time-out error. Call this at `deadline`.
     void timeOut(TimePoint now);
+    /// Bytes of the body in memory.
+    [[nodiscard]] std::size_t inMemory() const { return _body.size(); }
+    /// Fails the load because all loads together have too many bytes in memory.
+    void giveWay();
 
     struct Outcome {
         std::optional<Bytes> data;

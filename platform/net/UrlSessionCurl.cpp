@@ -25,6 +25,9 @@ namespace {
 /// Limit of idle connections to all hosts. Servers close them after seconds, and each takes a socket on both sides.
 constexpr long kIdleConnections = 32;
 
+/// Limit of the bytes of all incomplete bodies in memory: three of the largest, hundreds of ordinary ones.
+constexpr std::size_t kMaximumInMemory = 24u << 20;
+
 class CurlTask;
 
 /// The URL-loading thread. Members marked "loader thread" are confined to it.
@@ -51,6 +54,7 @@ private:
     void end(CURL* easy, CURLcode code, bool cancelled);
     [[nodiscard]] CURL* takeEasy();
     void giveBack(CURL* easy);
+    void relieve();
     [[nodiscard]] int nextTimeout();
     [[nodiscard]] bool readOn();
 
@@ -256,6 +260,17 @@ void Loader::end(CURL* easy, CURLcode code, bool cancelled)
     giveBack(easy);
 }
 
+/// While all bodies together take too much memory, fails the largest: ordinary responses are not the cause.
+void Loader::relieve()
+{
+    while (bodiesInMemory > kMaximumInMemory) {
+        const auto inMemory = [](const auto& entry) { return entry.second->load->inMemory(); };
+        CURL* largest = std::ranges::max_element(_active, {}, inMemory)->first;
+        _active.at(largest)->load->giveWay();
+        end(largest, CURLE_WRITE_ERROR, false);
+    }
+}
+
 /// Ends the loads that have timed out, and returns the milliseconds until the next time-out.
 int Loader::nextTimeout()
 {
@@ -323,6 +338,7 @@ void Loader::run()
         int left = 0;
         while (const CURLMsg* message = curl_multi_info_read(_multi, &left))
             if (message->msg == CURLMSG_DONE) end(message->easy_handle, message->data.result, false);
+        relieve();
         const int timeout = nextTimeout();
         int ready = 0;
         curl_multi_poll(_multi, nullptr, 0, mayBeUnread ? std::min(timeout, kQuiet) : timeout, &ready);

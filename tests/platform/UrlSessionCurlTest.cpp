@@ -329,6 +329,25 @@ TEST_F(CurlLoaderTest, PublicHostCannotLeadToAnInnerAddress)
     if (!possible) GTEST_SKIP() << "needs the right to make a network namespace";
 }
 
+TEST_F(CurlLoaderTest, TheLargestBodyGivesWayIfAllTakeTooMuch)
+{
+    const auto unfinished = [](std::size_t size) {
+        return fmt::format("HTTP/1.1 200 OK\r\nContent-Length: {}\r\n\r\n{}", size + 1, std::string(size, 'x'));
+    };
+    TestHttpServer server(byPath({{"/large", {unfinished(13u << 20)}},
+                                  {"/smaller", {unfinished(12u << 20)}},
+                                  {"/end", {httpAnswer(200, "end")}}}));
+    const auto large = make({.url = server.url("/large")}, {.maximumResponseSize = 20u << 20});
+    const auto smaller = make({.url = server.url("/smaller")}, {.maximumResponseSize = 20u << 20});
+    large->task->resume();
+    smaller->task->resume();
+    EXPECT_EQ(large->wait().code(), kUrlTooLarge);
+    EXPECT_EQ(load(server.url("/end")).body(), "end");
+    EXPECT_EQ(smaller->completions(), 0);
+    smaller->task->cancel();
+    EXPECT_EQ(smaller->wait().code(), kUrlCancelled);
+}
+
 TEST_F(CurlLoaderTest, ServersThatHangTimeOut)
 {
     const struct {
