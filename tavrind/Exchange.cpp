@@ -44,6 +44,8 @@ using platform::Value;
 
 namespace {
 
+/// Limit of the values of a response: ten times those of the largest ordinary one.
+constexpr std::size_t kMaximumValues = 1u << 18;
 constexpr std::chrono::seconds kDefaultTimeout{60}; ///< the loader's
 
 std::shared_ptr<TAVHTTPRequest> record(const UrlRequest& request)
@@ -238,7 +240,7 @@ void Exchange::_completed(std::optional<Bytes> data, std::optional<UrlResponse> 
         return failSearchFeedback(error, responseSize, statusCode, timingData);
     }
 
-    auto decoded = JsonDocument::parse(data->view());
+    auto decoded = JsonDocument::parse(data->view(), data->size(), kMaximumValues);
     const auto document = decoded ? std::make_shared<const JsonDocument>(std::move(*decoded)) : nullptr;
     // The store is queued before the reply, so that a client that has received an answer finds it in the cache. The
     // reply needs only the text, so the sets are created on the cache's queue.

@@ -40,6 +40,14 @@ bool nestsDeeper(dom::element element, std::size_t levels)
     return false;
 }
 
+/// Returns true if the text has at least `values` separators. Every value but the first is after one.
+bool mayHaveMoreValues(std::string_view text, std::size_t values)
+{
+    if (text.size() <= values) return false;
+    const auto isSeparator = [](char c) { return c == ',' || c == ':' || c == '[' || c == '{'; };
+    return static_cast<std::size_t>(std::ranges::count_if(text, isSeparator)) >= values;
+}
+
 simdjson::error_code parseBounded(dom::parser& parser, std::string_view text, dom::element& root)
 {
     // The parser doesn't count empty containers. With this limit no document nests too deep even with an empty
@@ -394,9 +402,11 @@ JsonDocument::JsonDocument(JsonDocument&&) noexcept = default;
 JsonDocument& JsonDocument::operator=(JsonDocument&&) noexcept = default;
 JsonDocument::~JsonDocument() = default;
 
-std::expected<JsonDocument, Error> JsonDocument::parse(std::string_view text, std::size_t maximumSize)
+std::expected<JsonDocument, Error> JsonDocument::parse(std::string_view text, std::size_t maximumSize,
+                                                       std::size_t maximumValues)
 {
     if (text.size() > maximumSize) return malformed(fmt::format("larger than {} bytes", maximumSize));
+    if (mayHaveMoreValues(text, maximumValues)) return malformed(fmt::format("more than {} values", maximumValues));
     if (text.starts_with("\xef\xbb\xbf")) text.remove_prefix(3);
 
     auto parsed = std::make_unique<Parsed>();

@@ -33,9 +33,10 @@ enum class JsonStyle { Compact, Pretty };
 /// Owns a copy of what it needs: the text may be freed after parsing. Immutable: any thread.
 class JsonDocument {
 public:
-    /// Accepts the same documents as `parseJson`.
-    [[nodiscard]] static std::expected<JsonDocument, Error> parse(std::string_view text,
-                                                                  std::size_t maximumSize = 64u << 20);
+    /// Accepts the same documents as `parseJson`, if they have at most about `maximumValues` values: small values take
+    /// many times their text in memory. Separators inside texts count as well.
+    [[nodiscard]] static std::expected<JsonDocument, Error>
+    parse(std::string_view text, std::size_t maximumSize = 64u << 20, std::size_t maximumValues = SIZE_MAX);
     JsonDocument(JsonDocument&&) noexcept;
     JsonDocument& operator=(JsonDocument&&) noexcept;
     ~JsonDocument();

@@ -97,6 +97,10 @@ TEST(Json, BoundsDepthAndSize)
         EXPECT_TRUE(parseJson(nested(levels))) << "after one that was refused";
     }
     EXPECT_FALSE(parseJson(arrays(1'000'000)));
+    for (const char* three : {"[1,2,3]", R"([{"a":2}])", "[[[3]]]"}) {
+        EXPECT_FALSE(JsonDocument::parse(three, 100, 3)) << three;
+        EXPECT_TRUE(JsonDocument::parse(three, 100, 4)) << three;
+    }
     EXPECT_FALSE(parseJson(std::string(1'000'000, '[')));
     EXPECT_TRUE(parseJson("[10]", 4));
     EXPECT_FALSE(parseJson("[100]", 4));
