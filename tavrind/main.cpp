@@ -4,6 +4,7 @@
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
+#include <malloc.h>
 #include <unistd.h>
 
 #include "CoreTavrin/TAVProtocols.h"
@@ -16,6 +17,7 @@
 int main(int argc, char** argv)
 {
     const tavrin::DaemonOptions options = tavrin::parseDaemonOptions(argc, argv);
+    mallopt(M_MMAP_THRESHOLD, 1 << 20); // the memory of large responses and messages goes back to the system at once
     platform::RunLoop::blockSignals();
     platform::setLogSink(options.logToJournal ? platform::LogSink::Journal : platform::LogSink::StandardError,
                          "tavrind");
