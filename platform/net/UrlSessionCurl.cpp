@@ -164,14 +164,16 @@ Loader::~Loader()
 
 void Loader::start(std::shared_ptr<CurlTask> task)
 {
+    bool taken = false;
     {
         MutexLock lock(_mutex);
         if (!_stopping) {
-            _commands.push_back({std::move(task), false});
+            _commands.push_back({task, false});
             if (!_thread.joinable()) _thread = std::thread([this] { run(); });
+            taken = true;
         }
     }
-    if (task) return task->completeCancelled();
+    if (!taken) return task->completeCancelled();
     curl_multi_wakeup(_multi);
 }
 

@@ -54,6 +54,7 @@ Value suggestionsFrom(std::vector<const Match*> matches, std::string_view query)
 std::vector<const Match*> pointersTo(const std::vector<Match>& matches)
 {
     std::vector<const Match*> pointers;
+    pointers.reserve(matches.size());
     for (const Match& match : matches) pointers.push_back(&match);
     return pointers;
 }
@@ -152,6 +153,7 @@ Value SearchAnswers::zeroKeyword() const
     for (const Entry& entry : _catalogue.entries()) entries.push_back(&entry);
     std::ranges::stable_sort(entries, std::ranges::greater(), &Entry::popularity);
     std::vector<Match> best;
+    best.reserve(entries.size());
     for (const Entry* entry : entries) best.push_back({entry, Quality::WholeTitle, {}, lowerCased(entry->title)});
 
     Value set = resultSet("", pointersTo(best));
