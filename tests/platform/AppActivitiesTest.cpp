@@ -14,14 +14,14 @@ namespace {
 using namespace std::chrono_literals;
 namespace fs = std::filesystem;
 
-const Date kNow = dateFromSecondsSince1970(1767225600);
+const Date kStart = dateFromSecondsSince1970(1767225600);
 
 struct AppActivitiesTest : testing::Test {
     AppActivity activity(std::string app, Duration before)
     {
-        return {.start = kNow - before, .bundleIdentifier = std::move(app), .publiclyIndexable = true};
+        return {.start = kStart - before, .bundleIdentifier = std::move(app), .publiclyIndexable = true};
     }
-    void add(const AppActivity& activity, Date now = kNow)
+    void add(const AppActivity& activity, Date now = kStart)
     {
         const auto added = store.add(activity, now);
         EXPECT_TRUE(added) << added.error().description();
@@ -34,7 +34,7 @@ struct AppActivitiesTest : testing::Test {
         for (const AppActivity& each : *activities) names += each.bundleIdentifier + " ";
         return names;
     }
-    std::string all() { return appsIn(kNow - 240h, kNow); }
+    std::string all() { return appsIn(kStart - 240h, kStart); }
     /// What `statements` make of the database.
     void alter(const char* statements)
     {
@@ -58,11 +58,11 @@ TEST_F(AppActivitiesTest, AreReadByDateWithinTheRangeAndTheLimit)
     add(activity("too-late", -1s));
     add(activity("b", 2h));
     add(activity("b-again", 2h));
-    EXPECT_EQ(appsIn(kNow - 24h, kNow), "a b b-again c d ");
-    EXPECT_EQ(appsIn(kNow - 24h + 1ns, kNow + 999ms), "b b-again c d ") << "activities begin at whole seconds";
-    EXPECT_EQ(appsIn(kNow - 24h, kNow, 3), "a b b-again ");
-    EXPECT_EQ(appsIn(kNow - 24h, kNow, SIZE_MAX), "a b b-again c d ");
-    EXPECT_EQ(appsIn(kNow, kNow - 24h), "");
+    EXPECT_EQ(appsIn(kStart - 24h, kStart), "a b b-again c d ");
+    EXPECT_EQ(appsIn(kStart - 24h + 1ns, kStart + 999ms), "b b-again c d ") << "activities begin at whole seconds";
+    EXPECT_EQ(appsIn(kStart - 24h, kStart, 3), "a b b-again ");
+    EXPECT_EQ(appsIn(kStart - 24h, kStart, SIZE_MAX), "a b b-again c d ");
+    EXPECT_EQ(appsIn(kStart, kStart - 24h), "");
 }
 
 TEST_F(AppActivitiesTest, KeepEveryFieldAndTheirAbsence)
@@ -71,8 +71,8 @@ TEST_F(AppActivitiesTest, KeepEveryFieldAndTheirAbsence)
     full.relatedUniqueIdentifier = "item'; DROP TABLE app_activity; --";
     full.contentUrl = "https://news.example/ü?q=1";
     add(full);
-    add({.start = kNow, .bundleIdentifier = "bare", .contentUrl = ""});
-    const auto read = store.queryAppActivitiesAfterDate(kNow - 24h, kNow, 100).value();
+    add({.start = kStart, .bundleIdentifier = "bare", .contentUrl = ""});
+    const auto read = store.queryAppActivitiesAfterDate(kStart - 24h, kStart, 100).value();
     ASSERT_EQ(read.size(), 2u);
     EXPECT_EQ(read[0].bundleIdentifier, full.bundleIdentifier);
     EXPECT_EQ(read[0].relatedUniqueIdentifier, full.relatedUniqueIdentifier);
@@ -90,35 +90,35 @@ TEST_F(AppActivitiesTest, AreForgottenAfterSevenDaysAndNotTakenLater)
 {
     add(activity("old", 0s));
     add(activity("new", -24h));
-    add(activity("newest", -(168h + 1s)), kNow + 168h + 1s);
-    EXPECT_EQ(appsIn(kNow - 24h, kNow + 240h), "new newest ");
-    EXPECT_FALSE(store.add(activity("late", 168h + 1s), kNow));
-    EXPECT_EQ(appsIn(kNow - 240h, kNow + 240h), "new newest ") << "nothing was done for one that is refused";
+    add(activity("newest", -(168h + 1s)), kStart + 168h + 1s);
+    EXPECT_EQ(appsIn(kStart - 24h, kStart + 240h), "new newest ");
+    EXPECT_FALSE(store.add(activity("late", 168h + 1s), kStart));
+    EXPECT_EQ(appsIn(kStart - 240h, kStart + 240h), "new newest ") << "nothing was done for one that is refused";
 }
 
 TEST_F(AppActivitiesTest, WhatIsNoDatabaseIsAnErrorAndStaysAsItIs)
 {
-    EXPECT_FALSE(store.queryAppActivitiesAfterDate(kNow, kNow, 1));
+    EXPECT_FALSE(store.queryAppActivitiesAfterDate(kStart, kStart, 1));
     EXPECT_FALSE(fs::exists(file)) << "reading makes nothing";
     fs::create_directories(file);
-    EXPECT_FALSE(store.queryAppActivitiesAfterDate(kNow, kNow, 1));
-    EXPECT_FALSE(store.add(activity("a", 0s), kNow));
+    EXPECT_FALSE(store.queryAppActivitiesAfterDate(kStart, kStart, 1));
+    EXPECT_FALSE(store.add(activity("a", 0s), kStart));
     fs::remove(file);
     ASSERT_EQ(mkfifo(file.c_str(), 0600), 0);
-    EXPECT_FALSE(store.queryAppActivitiesAfterDate(kNow, kNow, 1)) << "and nobody waits for a writer";
+    EXPECT_FALSE(store.queryAppActivitiesAfterDate(kStart, kStart, 1)) << "and nobody waits for a writer";
     fs::remove(file);
     test::writeFile(file, std::string(4096, 'x'));
-    EXPECT_FALSE(store.queryAppActivitiesAfterDate(kNow, kNow, 1));
-    EXPECT_FALSE(store.add(activity("a", 0s), kNow));
+    EXPECT_FALSE(store.queryAppActivitiesAfterDate(kStart, kStart, 1));
+    EXPECT_FALSE(store.add(activity("a", 0s), kStart));
     EXPECT_EQ(fs::file_size(file), 4096u);
     fs::rename(file, directory / "elsewhere");
     fs::create_symlink(directory / "elsewhere", file);
-    EXPECT_FALSE(store.queryAppActivitiesAfterDate(kNow, kNow, 1));
+    EXPECT_FALSE(store.queryAppActivitiesAfterDate(kStart, kStart, 1));
     fs::remove(file);
 
     add(activity("a", 0s));
     fs::resize_file(file, fs::file_size(file) / 2);
-    EXPECT_FALSE(store.queryAppActivitiesAfterDate(kNow - 24h, kNow, 100));
+    EXPECT_FALSE(store.queryAppActivitiesAfterDate(kStart - 24h, kStart, 100));
 }
 
 TEST_F(AppActivitiesTest, ADatabaseOfAnotherMakeIsAnErrorWhateverItHolds)
@@ -139,9 +139,9 @@ TEST_F(AppActivitiesTest, ADatabaseOfAnotherMakeIsAnErrorWhateverItHolds)
     };
     for (const auto& [statements, readable] : cases) {
         alter(statements);
-        EXPECT_EQ(store.queryAppActivitiesAfterDate(kNow - 24h, kNow, 100).has_value(), readable) << statements;
+        EXPECT_EQ(store.queryAppActivitiesAfterDate(kStart - 24h, kStart, 100).has_value(), readable) << statements;
     }
-    EXPECT_FALSE(store.add(activity("a", 0s), kNow)) << "what another version keeps is not ours to change";
+    EXPECT_FALSE(store.add(activity("a", 0s), kStart)) << "what another version keeps is not ours to change";
 }
 
 TEST_F(AppActivitiesTest, ALockedDatabaseIsAnErrorAtOnceAndReadableAgainLater)
@@ -149,7 +149,7 @@ TEST_F(AppActivitiesTest, ALockedDatabaseIsAnErrorAtOnceAndReadableAgainLater)
     add(activity("a", 0s));
     auto other = Sqlite::open(file, Sqlite::Access::Shared).value();
     ASSERT_TRUE(other.execute("BEGIN EXCLUSIVE"));
-    const auto locked = store.queryAppActivitiesAfterDate(kNow - 24h, kNow, 100);
+    const auto locked = store.queryAppActivitiesAfterDate(kStart - 24h, kStart, 100);
     ASSERT_FALSE(locked);
     EXPECT_EQ(locked.error().domain, kSqliteErrorDomain);
     EXPECT_EQ(locked.error().code, 5) << "busy";

@@ -8,7 +8,7 @@ namespace {
 using std::chrono::seconds;
 
 /// 1 January 2026, 00:00:00.
-const Date kNow = dateFromSecondsSince1970(1767225600);
+const Date kReceived = dateFromSecondsSince1970(1767225600);
 constexpr const char* kNowText = "Thu, 01 Jan 2026 00:00:00 GMT";
 constexpr const char* kTenDaysAgo = "Mon, 22 Dec 2025 00:00:00 GMT";
 constexpr const char* kInAnHour = "Thu, 01 Jan 2026 01:00:00 GMT";
@@ -29,7 +29,7 @@ StoredResponse stored(HttpHeaders headers, const UrlRequest& request = get())
     kept.response = answer(std::move(headers));
     kept.body = Bytes("body");
     kept.selecting = selectingFields(kept.response, request).value_or("*");
-    kept.requested = kept.received = kNow;
+    kept.requested = kept.received = kReceived;
     return kept;
 }
 
@@ -90,9 +90,9 @@ TEST(HttpCachePolicyTest, LifetimesComeFromTheBestSourceAndWrongOnesAreNone)
     for (const auto& [headers, lifetime] : cases) {
         std::string fields;
         for (const auto& [name, value] : headers) fields += name + ": " + value + "; ";
-        EXPECT_EQ(freshnessLifetime(answer(headers), kNow).count(), lifetime) << fields;
+        EXPECT_EQ(freshnessLifetime(answer(headers), kReceived).count(), lifetime) << fields;
     }
-    EXPECT_EQ(freshnessLifetime(answer({{"Last-Modified", kTenDaysAgo}}, 500), kNow).count(), 0);
+    EXPECT_EQ(freshnessLifetime(answer({{"Last-Modified", kTenDaysAgo}}, 500), kReceived).count(), 0);
 }
 
 TEST(HttpCachePolicyTest, OnlyWhatCouldBeUsedAgainIsKept)
@@ -119,22 +119,22 @@ TEST(HttpCachePolicyTest, OnlyWhatCouldBeUsedAgainIsKept)
         {200, {{"Cache-Control", "private, no-cache"}, {"ETag", "\"a\""}}, true},
     };
     for (const auto& c : cases)
-        EXPECT_EQ(isStorable(get(), answer(c.headers, c.status), kNow), c.storable)
+        EXPECT_EQ(isStorable(get(), answer(c.headers, c.status), kReceived), c.storable)
             << c.status << " " << (c.headers.empty() ? "" : c.headers.begin()->second);
     UrlResponse file = answer({{"ETag", "\"a\""}});
     file.isHttp = false;
-    EXPECT_FALSE(isStorable(get(), file, kNow));
+    EXPECT_FALSE(isStorable(get(), file, kReceived));
 }
 
 TEST(HttpCachePolicyTest, AgeCountsWhatOthersKeptItAndTheWay)
 {
     StoredResponse kept = stored({{"Age", "100"}, {"Date", kNowText}});
-    EXPECT_EQ(currentAge(kept, kNow).count(), 100);
-    kept.requested = kNow - seconds(5);
-    EXPECT_EQ(currentAge(kept, kNow + seconds(10)).count(), 115);
-    EXPECT_EQ(currentAge(stored({{"Date", kTenDaysAgo}}), kNow).count(), 864000)
+    EXPECT_EQ(currentAge(kept, kReceived).count(), 100);
+    kept.requested = kReceived - seconds(5);
+    EXPECT_EQ(currentAge(kept, kReceived + seconds(10)).count(), 115);
+    EXPECT_EQ(currentAge(stored({{"Date", kTenDaysAgo}}), kReceived).count(), 864000)
         << "the server's clock, or a cache's delay";
-    EXPECT_EQ(currentAge(stored({{"Date", kInAnHour}, {"Age", "soon"}}), kNow).count(), 0);
+    EXPECT_EQ(currentAge(stored({{"Date", kInAnHour}, {"Age", "soon"}}), kReceived).count(), 0);
 }
 
 TEST(HttpCachePolicyTest, AnAnswerIsWorthWhatItsAgeAndTheRequestAllow)
@@ -159,16 +159,16 @@ TEST(HttpCachePolicyTest, AnAnswerIsWorthWhatItsAgeAndTheRequestAllow)
         {{{"Cache-Control", "max-age=60"}, {"Age", "60"}}, {}, 0, None},
     };
     for (const auto& c : cases)
-        EXPECT_EQ(reuse(stored(c.kept), get(c.asked), kNow + seconds(c.later)), c.worth)
+        EXPECT_EQ(reuse(stored(c.kept), get(c.asked), kReceived + seconds(c.later)), c.worth)
             << c.kept.begin()->second << " after " << c.later;
 
     const UrlRequest german = get({{"Accept-Language", "de"}, {"X", "1"}});
     const StoredResponse varied =
         stored({{"Cache-Control", "max-age=60"}, {"Vary", "accept-language, X-Other"}, {"ETag", "\"a\""}}, german);
-    EXPECT_EQ(reuse(varied, german, kNow), Answer);
-    EXPECT_EQ(reuse(varied, get({{"Accept-Language", "de"}, {"X", "2"}}), kNow), Answer);
-    EXPECT_EQ(reuse(varied, get({{"Accept-Language", "en"}}), kNow), None);
-    EXPECT_EQ(reuse(varied, get({{"Accept-Language", "de"}, {"X-Other", ""}, {"x-other", "1"}}), kNow), None);
+    EXPECT_EQ(reuse(varied, german, kReceived), Answer);
+    EXPECT_EQ(reuse(varied, get({{"Accept-Language", "de"}, {"X", "2"}}), kReceived), Answer);
+    EXPECT_EQ(reuse(varied, get({{"Accept-Language", "en"}}), kReceived), None);
+    EXPECT_EQ(reuse(varied, get({{"Accept-Language", "de"}, {"X-Other", ""}, {"x-other", "1"}}), kReceived), None);
 }
 
 TEST(HttpCachePolicyTest, AConfirmationBringsFieldsUpToDateAndLeavesTheBodysOwn)
@@ -196,15 +196,15 @@ TEST(HttpCachePolicyTest, AConfirmationBringsFieldsUpToDateAndLeavesTheBodysOwn)
                                             {"Set-Cookie", "b"},
                                             {"Transfer-Encoding", "chunked"}},
                                            304);
-    const StoredResponse now = confirmed(kept, notModified, kNow + seconds(101), kNow + seconds(101));
+    const StoredResponse now = confirmed(kept, notModified, kReceived + seconds(101), kReceived + seconds(101));
     EXPECT_EQ(now.response.statusCode, 200);
     EXPECT_EQ(now.body.view(), "body");
     EXPECT_EQ(now.response.headers.list("Content-Length"), "4");
     EXPECT_EQ(now.response.headers.list("Set-Cookie"), "a, b");
     EXPECT_EQ(now.response.headers.list("X-Kept"), "1");
     EXPECT_FALSE(now.response.headers.find("Transfer-Encoding"));
-    EXPECT_EQ(reuse(now, get(), kNow + seconds(105)), Reuse::Answer);
-    EXPECT_EQ(reuse(now, get(), kNow + seconds(106)), Reuse::Confirm);
+    EXPECT_EQ(reuse(now, get(), kReceived + seconds(105)), Reuse::Answer);
+    EXPECT_EQ(reuse(now, get(), kReceived + seconds(106)), Reuse::Confirm);
 }
 
 } // namespace
