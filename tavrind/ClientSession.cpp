@@ -105,8 +105,7 @@ bool ClientSession::_updateFirstUseDate()
         log(kLogSession).info("user default key not found for agent: {}", _header.agent);
         return false;
     }
-    _assembly.userDefaults.set(*key, *_header.baseTime);
-    (void)_assembly.userDefaults.synchronize();
+    _assembly.userDefaults.set(*key, *_header.baseTime); // written on the store's queue, whose disk no client waits for
     if (const auto client = dailyActiveClient(*key))
         _assembly.diagnosticData.addValue(1, createCounterKey(*client, "dailyactiveusers"));
     return true;

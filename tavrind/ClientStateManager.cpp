@@ -89,8 +89,8 @@ void ClientStateManager::saveState()
 {
     if (!_persistSessions) return;
     stateCacheQueue->async([self = shared_from_this()] {
+        // Written on the store's queue: clients wait for this one.
         self->_assembly.userDefaults.set(kSessionsKey, self->_sessions());
-        (void)self->_assembly.userDefaults.synchronize();
     });
 }
 

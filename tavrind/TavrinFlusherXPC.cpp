@@ -88,6 +88,7 @@ void TavrinFlusherXPC::_removeDelegate(const Tool& tool)
         remove(_receivingStreamListener, "receiving stream");
         remove(_sendingStreamListener, "sending stream");
         remove(_remoteObject, "remote");
+        _eventsAreWatched = _receivingStreamListener != nullptr;
     });
 }
 
@@ -95,7 +96,10 @@ void TavrinFlusherXPC::initiateConnectionWithIntent(std::uint64_t intent, std::s
 {
     const void* delegate = tool.get();
     const auto assign = [&](Tool TavrinFlusherXPC::* role) {
-        _queue->sync([&] { _remoteObject = this->*role = tool; });
+        _queue->sync([&] {
+            _remoteObject = this->*role = tool;
+            _eventsAreWatched = _receivingStreamListener != nullptr;
+        });
     };
     switch (static_cast<FlusherIntent>(intent)) {
     case FlusherIntent::WatchFlushes:
@@ -147,7 +151,8 @@ void TavrinFlusherXPC::sendDataToSendingStreamListener(const platform::Bytes& bo
 
 void TavrinFlusherXPC::sendDataToReceivingStreamListener(const TavrinFeedback& feedback)
 {
-    const Tool listener = _holderOf(&TavrinFlusherXPC::_receivingStreamListener);
+    // An event that nobody watches takes no turn on the queue.
+    const Tool listener = _eventsAreWatched ? _holderOf(&TavrinFlusherXPC::_receivingStreamListener) : nullptr;
     const bool logged = platform::Log::enabled(platform::LogLevel::Debug);
     if (!listener && !logged) return;
     const std::string description = feedback.description();

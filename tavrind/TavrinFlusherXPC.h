@@ -1,5 +1,6 @@
 #pragma once
 
+#include <atomic>
 #include <functional>
 #include <memory>
 #include <string>
@@ -54,6 +55,7 @@ private:
     Tool _remoteObject;                            ///< the tool that connected or sent a command last
     Tool _sendingStreamListener;
     Tool _receivingStreamListener;
+    std::atomic<bool> _eventsAreWatched = false; ///< there is a `_receivingStreamListener`; any thread
 };
 
 } // namespace tavrin
