@@ -13,6 +13,7 @@
 #include "tavrind/DownloadManager.h"
 #include "tavrind/encoder.h"
 #include "tavrind/mmap_file.h"
+#include "tavrind/QueueRanks.h"
 #include "tavrind/TavrinLogging.h"
 
 namespace tavrin {
@@ -99,7 +100,7 @@ std::shared_ptr<AppWhitelistController> AppWhitelistController::make(Assembly& a
 }
 
 AppWhitelistController::AppWhitelistController(Assembly& assembly)
-    : _assembly(assembly), _queue(assembly.device.serialQueue("com.quorvane.tavrind.appWhitelist")),
+    : _assembly(assembly), _queue(assembly.device.serialQueue("com.quorvane.tavrind.appWhitelist", rank::kStore)),
       _whitelistSignature(assembly.userDefaults.string(kSignatureKey).value_or(""))
 {}
 

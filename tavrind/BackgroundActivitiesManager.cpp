@@ -9,6 +9,7 @@
 #include "tavrind/Assembly.h"
 #include "tavrind/FeedbackBooks.h"
 #include "tavrind/FileContainer.h"
+#include "tavrind/QueueRanks.h"
 #include "tavrind/StoredSession.h"
 #include "tavrind/TavrinFeedbackFlusher.h"
 #include "tavrind/TavrinFlusherXPC.h"
@@ -67,8 +68,9 @@ std::shared_ptr<BackgroundActivitiesManager> BackgroundActivitiesManager::make(A
 }
 
 BackgroundActivitiesManager::BackgroundActivitiesManager(Assembly& assembly)
-    : _assembly(assembly), _queueFlusher(assembly.device.serialQueue(
-                               "com.quorvane.tavrind.backgrondActivitiesManagerQueue", platform::Priority::Background)),
+    : _assembly(assembly),
+      _queueFlusher(assembly.device.serialQueue("com.quorvane.tavrind.backgrondActivitiesManagerQueue", rank::kRoot,
+                                                platform::Priority::Background)),
       _feedbackFlusher(TavrinFeedbackFlusher::make(assembly, FlusherIdentity::Feedbacks))
 {}
 

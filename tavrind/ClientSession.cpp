@@ -17,6 +17,7 @@
 #include "tavrind/FeedbackBooks.h"
 #include "tavrind/FeedbackTypes.h"
 #include "tavrind/FileContainer.h"
+#include "tavrind/QueueRanks.h"
 #include "tavrind/StoredSession.h"
 #include "tavrind/TavrinFeedback.h"
 #include "tavrind/TavrinFlusherXPC.h"
@@ -68,7 +69,8 @@ ClientSession::ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback>
 
 ClientSession::ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback> feedback,
                              std::int64_t previousSessionEndReason, std::shared_ptr<void> call, FileUse use)
-    : _assembly(assembly), _sessionQueue(assembly.device.serialQueue("com.quorvane.tavrind.clientSessionQueue")),
+    : _assembly(assembly),
+      _sessionQueue(assembly.device.serialQueue("com.quorvane.tavrind.clientSessionQueue", rank::kStore)),
       _sessionFeedbacks(std::make_shared<Feedbacks>())
 {
     if (feedback) {

@@ -16,6 +16,7 @@
 #include "tavrind/ClientSessionShared.h"
 #include "tavrind/FeedbackBooks.h"
 #include "tavrind/FeedbackTypes.h"
+#include "tavrind/QueueRanks.h"
 #include "tavrind/TavrinBagController.h"
 #include "tavrind/TavrinFeedback.h"
 #include "tavrind/TavrinLogging.h"
@@ -73,7 +74,7 @@ const ClientSessionManager::Transition ClientSessionManager::kTransitions[] = {
 ClientSessionManager::ClientSessionManager(Assembly& assembly, std::shared_ptr<TavrinUserGUIDController> guidController,
                                            std::string identifier)
     : _assembly(assembly), _guidController(std::move(guidController)), _identifier(std::move(identifier)),
-      _sessionQueue(assembly.device.serialQueue("com.quorvane.tavrind.clientSessionManagerQueue"))
+      _sessionQueue(assembly.device.serialQueue("com.quorvane.tavrind.clientSessionManagerQueue", rank::kManager))
 {
     if (assembly.sharedSession)
         log(kLogSession).log("Tavrin is using shared session for all clients {}", _identifier);

@@ -4,6 +4,7 @@
 
 #include "platform/device/Device.h"
 #include "tavrind/Assembly.h"
+#include "tavrind/QueueRanks.h"
 #include "tavrind/TavrinFeedback.h"
 
 namespace tavrin {
@@ -12,7 +13,7 @@ ClientSessionShared::ClientSessionShared(Assembly& assembly, std::shared_ptr<Tav
                                          std::int64_t previousSessionEndReason, std::shared_ptr<void> call)
     : _assembly(assembly), _userGuid(platform::Uuid::parse(feedback->userGuid).value_or(platform::Uuid())),
       _previousSessionEndReason(previousSessionEndReason),
-      _sessionQueue(assembly.device.serialQueue("com.quorvane.tavrind.clientSessionSharedQueue"))
+      _sessionQueue(assembly.device.serialQueue("com.quorvane.tavrind.clientSessionSharedQueue", rank::kShared))
 {
     _begin(std::move(feedback), std::move(call));
 }

@@ -13,6 +13,7 @@
 #include "tavrind/Exchange.h"
 #include "tavrind/FeedbackRecords.h"
 #include "tavrind/QueryCache.h"
+#include "tavrind/QueueRanks.h"
 #include "tavrind/RequestKind.h"
 #include "tavrind/TAVNetworkRequestFactory.h"
 #include "tavrind/TavrinBagController.h"
@@ -37,7 +38,7 @@ std::optional<std::string> shortName(const std::string& identifier)
 
 ClientState::ClientState(std::string identifier, Assembly& assembly)
     : _assembly(assembly), _identifier(std::move(identifier)), _clientShortName(shortName(_identifier)),
-      _queue(assembly.device.serialQueue("com.quorvane.tavrind.clientState")),
+      _queue(assembly.device.serialQueue("com.quorvane.tavrind.clientState", rank::kStore)),
       _bagFetch(std::make_shared<platform::Event>())
 {
     if (assembly.userDefaults.boolean("TAVNoQueryCache")) {

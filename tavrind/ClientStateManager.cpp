@@ -12,6 +12,7 @@
 #include "tavrind/Assembly.h"
 #include "tavrind/ClientState.h"
 #include "tavrind/ImageLoader.h"
+#include "tavrind/QueueRanks.h"
 #include "tavrind/RequestKind.h"
 #include "tavrind/TavrinLogging.h"
 
@@ -39,7 +40,7 @@ std::shared_ptr<ClientStateManager> ClientStateManager::make(Assembly& assembly)
 
 ClientStateManager::ClientStateManager(Assembly& assembly)
     : _assembly(assembly), _persistSessions(assembly.userDefaults.boolean("TAVPersistSessions")),
-      stateCacheQueue(assembly.device.serialQueue("com.quorvane.tavrind.stateCache")),
+      stateCacheQueue(assembly.device.serialQueue("com.quorvane.tavrind.stateCache", rank::kManager)),
       _imageLoader(std::make_shared<ImageLoader>(assembly)),
       _listener(assembly.device.ipc.anonymous(endpointInterface(), "com.quorvane.tavrind.endpoint"))
 {}

@@ -26,6 +26,8 @@ DaemonOptions parseDaemonOptions(int argc, char** argv)
     std::string sink;
     app.add_option("--log-to", sink, "Where the log goes (default: the journal under systemd, else stderr)")
         ->check(CLI::IsMember({"stderr", "journal"}));
+    app.add_flag("--check-queues", options.checkQueues,
+                 "Abort with an explanation if queues may wait for each other (for development)");
     try {
         app.parse(argc, argv);
     } catch (const CLI::ParseError& error) {

@@ -7,6 +7,7 @@ namespace tavrin {
 struct DaemonOptions {
     bool logToJournal = false;
     platform::LogLevel logLevel = platform::LogLevel::Default;
+    bool checkQueues = false;
 };
 
 /// Parses the command line. For --help, --version and invalid options, prints a text and ends the process.

@@ -9,6 +9,7 @@
 #include "platform/files/UserDefaults.h"
 #include "platform/values/Dictionary.h"
 #include "tavrind/Assembly.h"
+#include "tavrind/QueueRanks.h"
 #include "tavrind/TAVNetworkRequestFactory.h"
 #include "tavrind/TavrinBagController.h"
 #include "tavrind/TavrinLogging.h"
@@ -72,8 +73,8 @@ std::shared_ptr<DownloadManager> DownloadManager::make(Assembly& assembly)
 }
 
 DownloadManager::DownloadManager(Assembly& assembly)
-    : _assembly(assembly),
-      _queue(assembly.device.serialQueue("com.quorvane.tavrin.DownloadManager", platform::Priority::Background))
+    : _assembly(assembly), _queue(assembly.device.serialQueue("com.quorvane.tavrin.DownloadManager", rank::kRoot,
+                                                              platform::Priority::Background))
 {
     _loadResources(); // for readers before `_start`
 }

@@ -19,6 +19,7 @@
 #include "tavrind/ClientSessionManager.h"
 #include "tavrind/FeedbackRecords.h"
 #include "tavrind/mmap_file.h"
+#include "tavrind/QueueRanks.h"
 #include "tavrind/TavrinBagController.h"
 #include "tavrind/TavrinFeedback.h"
 #include "tavrind/TavrinLogging.h"
@@ -65,8 +66,9 @@ struct ImageLoader::Load {
 };
 
 ImageLoader::ImageLoader(Assembly& assembly)
-    : _assembly(assembly), _imageHostsQueue(assembly.device.concurrentQueue("com.quorvane.tavrind.imageHostsQueue")),
-      _imageQueue(assembly.device.serialQueue("com.quorvane.tavrind.images"))
+    : _assembly(assembly),
+      _imageHostsQueue(assembly.device.concurrentQueue("com.quorvane.tavrind.imageHostsQueue", rank::kStore)),
+      _imageQueue(assembly.device.serialQueue("com.quorvane.tavrind.images", rank::kRoot))
 {}
 
 std::set<std::string> ImageLoader::validImageHosts() const

@@ -17,6 +17,7 @@
 #include "platform/values/Dictionary.h"
 #include "platform/values/Json.h"
 #include "tavrind/Assembly.h"
+#include "tavrind/QueueRanks.h"
 #include "tavrind/TavrinLogging.h"
 
 namespace tavrin {
@@ -154,7 +155,7 @@ std::shared_ptr<Lookup> Lookup::make(Assembly& assembly)
 }
 
 Lookup::Lookup(Assembly& assembly)
-    : _assembly(assembly), _queue(assembly.device.serialQueue("com.quorvane.tavrin.Lookup"))
+    : _assembly(assembly), _queue(assembly.device.serialQueue("com.quorvane.tavrin.Lookup", rank::kManager))
 {}
 
 bool Lookup::lookupEnabled() const

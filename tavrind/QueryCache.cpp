@@ -7,6 +7,7 @@
 #include "platform/run/Clock.h"
 #include "platform/text/Text.h"
 #include "tavrind/Assembly.h"
+#include "tavrind/QueueRanks.h"
 #include "tavrind/TAVNetworkRequestFactory.h"
 #include "tavrind/TavrinLogging.h"
 #include "tavrind/TavrinUserGUIDController.h"
@@ -40,7 +41,7 @@ std::shared_ptr<QueryCache> QueryCache::make(Assembly& assembly)
 }
 
 QueryCache::QueryCache(Assembly& assembly)
-    : _assembly(assembly), _queue(assembly.device.serialQueue("com.quorvane.tavrin.queryCache"))
+    : _assembly(assembly), _queue(assembly.device.serialQueue("com.quorvane.tavrin.queryCache", rank::kStore))
 {}
 
 std::shared_ptr<const CachedResultSet> QueryCache::get(std::string text)

@@ -15,6 +15,7 @@
 #include "tavrind/ClientStateManager.h"
 #include "tavrind/DownloadManager.h"
 #include "tavrind/Lookup.h"
+#include "tavrind/QueueRanks.h"
 #include "tavrind/TAVNetworkRequestFactory.h"
 #include "tavrind/TavrinBagController.h"
 #include "tavrind/TavrinDPAppDeepLinkIngester.h"
@@ -46,14 +47,14 @@ platform::UrlSessionConfiguration foregroundConfiguration(const platform::Device
             .meteredPurgeTimeout = 10s,
             .network = &device.network,
             .caFile = caFile(),
-            .cache = platform::HttpCacheConfiguration{.memoryCapacity = 1u << 20,
-                                                      .diskCapacity = 100u << 20,
-                                                      .minimumMappedSize = 16384,
-                                                      .directory =
-                                                          device.directories.caches / "com.quorvane.tavrind" / "http",
-                                                      .files = &device.files,
-                                                      .queue = device.serialQueue("com.quorvane.tavrind.httpCache"),
-                                                      .clock = &device.clock}};
+            .cache = platform::HttpCacheConfiguration{
+                .memoryCapacity = 1u << 20,
+                .diskCapacity = 100u << 20,
+                .minimumMappedSize = 16384,
+                .directory = device.directories.caches / "com.quorvane.tavrind" / "http",
+                .files = &device.files,
+                .queue = device.serialQueue("com.quorvane.tavrind.httpCache", rank::kContext),
+                .clock = &device.clock}};
 }
 
 } // namespace
@@ -71,7 +72,7 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device)
 
     auto daemon = std::make_unique<Daemon>(device);
     Assembly& assembly = daemon->assembly;
-    const auto sessionQueue = [&](const char* label) { return device.concurrentQueue(label); };
+    const auto sessionQueue = [&](const char* label) { return device.concurrentQueue(label, rank::kRoot); };
 
     assembly.urlSession =
         device.urlLoader.makeSession(foregroundConfiguration(device), sessionQueue("com.quorvane.tavrind.urlSession"));
@@ -82,8 +83,12 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device)
     assembly.crowdsourcingFeedbackFlusher = TavrinFeedbackFlusher::make(assembly, FlusherIdentity::Crowdsourcing);
     assembly.backgroundFlusher = BackgroundActivitiesManager::make(assembly);
     assembly.downloadURLSession = device.backgroundSessions.make(
-        {.identifier = "com.quorvane.tavrind", .allowsMetered = false, .resourceTimeout = 24h, .caFile = caFile()},
-        assembly.downloadManager, device.serialQueue("com.quorvane.tavrind.downloadSession"));
+        {.identifier = "com.quorvane.tavrind",
+         .allowsMetered = false,
+         .resourceTimeout = 24h,
+         .caFile = caFile(),
+         .rank = rank::kContext},
+        assembly.downloadManager, device.serialQueue("com.quorvane.tavrind.downloadSession", rank::kRoot));
     assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.launch");
     assembly.bagSession =
         device.urlLoader.makeSession({.meteredPurgeTimeout = 10s, .network = &device.network, .caFile = caFile()},
@@ -92,8 +97,9 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device)
         {.identifier = "com.quorvane.tavrind.flusher.nsurlsession",
          .requestTimeout = 300s,
          .resourceTimeout = std::chrono::days(7),
-         .caFile = caFile()},
-        assembly.backgroundFlusher, device.serialQueue("com.quorvane.tavrind.uploadSession"));
+         .caFile = caFile(),
+         .rank = rank::kContext},
+        assembly.backgroundFlusher, device.serialQueue("com.quorvane.tavrind.uploadSession", rank::kRoot));
     assembly.backgroundFlusher->findUploads();
     assembly.lookup = Lookup::make(assembly);
     assembly.bagController = TavrinBagController::make(assembly);
@@ -116,7 +122,7 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device)
     });
     daemon->listener->resume();
 
-    const auto launchEventQueue = device.serialQueue("com.quorvane.tavrind.xpc_event");
+    const auto launchEventQueue = device.serialQueue("com.quorvane.tavrind.xpc_event", rank::kRoot);
     for (const std::string& event : device.launchEvents)
         launchEventQueue->async([event] { platform::defaultLog().log("launch event for {}", event); });
 

@@ -14,6 +14,7 @@
 #include "tavrind/Assembly.h"
 #include "tavrind/ClientSessionManager.h"
 #include "tavrind/FeedbackRecords.h"
+#include "tavrind/QueueRanks.h"
 #include "tavrind/TavrinBagController.h"
 #include "tavrind/TavrinLogging.h"
 #include "tavrind/TavrinURLRequestBuilder.h"
@@ -233,7 +234,8 @@ std::shared_ptr<TAVNetworkRequestFactory> TAVNetworkRequestFactory::make(Assembl
 }
 
 TAVNetworkRequestFactory::TAVNetworkRequestFactory(Assembly& assembly)
-    : _assembly(assembly), _contextAccessQueue(assembly.device.concurrentQueue("com.quorvane.tavrind.contextaccess"))
+    : _assembly(assembly),
+      _contextAccessQueue(assembly.device.concurrentQueue("com.quorvane.tavrind.contextaccess", rank::kContext))
 {}
 
 TAVNetworkRequestFactory::~TAVNetworkRequestFactory() = default;

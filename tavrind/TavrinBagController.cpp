@@ -21,6 +21,7 @@
 #include "tavrind/ClientSessionManager.h"
 #include "tavrind/FeedbackRecords.h"
 #include "tavrind/Flags.h"
+#include "tavrind/QueueRanks.h"
 #include "tavrind/TAVNetworkRequestFactory.h"
 #include "tavrind/TAVRetryableNetworkRequest.h"
 #include "tavrind/TavrinFeedback.h"
@@ -136,8 +137,8 @@ std::shared_ptr<TavrinBagController> TavrinBagController::make(Assembly& assembl
 }
 
 TavrinBagController::TavrinBagController(Assembly& assembly)
-    : _assembly(assembly),
-      _inMemoryBagCacheAccessQueue(assembly.device.concurrentQueue("com.quorvane.tavrind.bagcontroller.cacheaccess")),
+    : _assembly(assembly), _inMemoryBagCacheAccessQueue(assembly.device.concurrentQueue(
+                               "com.quorvane.tavrind.bagcontroller.cacheaccess", rank::kStore)),
       _userAgent(ClientSessionManager::tavrindUserAgent())
 {}
 

@@ -5,6 +5,7 @@
 #include "platform/device/Device.h"
 #include "platform/run/Queue.h"
 #include "tavrind/Assembly.h"
+#include "tavrind/QueueRanks.h"
 
 namespace tavrin {
 
@@ -34,7 +35,8 @@ std::shared_ptr<const TavrinDPPeriodicTask> TavrinDPPeriodicTask::taskWithName(A
 
 TavrinDPPeriodicTask::TavrinDPPeriodicTask(Assembly& assembly, std::string name, std::uint64_t period, Handler handler)
     : _name(std::move(name)), _periodSeconds(std::max(period, kShortestPeriod)), _handler(std::move(handler)),
-      _queue(assembly.device.serialQueue("com.quorvane._DPPeriodicTasks.defaultQueue", platform::Priority::Background)),
+      _queue(assembly.device.serialQueue("com.quorvane._DPPeriodicTasks.defaultQueue", rank::kRoot,
+                                         platform::Priority::Background)),
       _executionCriteria(criteriaFor(_periodSeconds))
 {}
 

@@ -4,6 +4,7 @@
 #include "platform/run/Queue.h"
 #include "platform/run/Transactions.h"
 #include "tavrind/Assembly.h"
+#include "tavrind/QueueRanks.h"
 #include "tavrind/TavrinDPPeriodicTask.h"
 #include "tavrind/TavrinLogging.h"
 #include "tavrind/TavrinXPCActivity.h"
@@ -33,7 +34,7 @@ void run(const std::shared_ptr<const TavrinDPPeriodicTask>& task, const std::sha
 } // namespace
 
 TavrinDPPeriodicTaskManager::TavrinDPPeriodicTaskManager(Assembly& assembly)
-    : _assembly(assembly), _queue(assembly.device.serialQueue("com.quorvane.tavrind.periodicTasks"))
+    : _assembly(assembly), _queue(assembly.device.serialQueue("com.quorvane.tavrind.periodicTasks", rank::kStore))
 {}
 
 void TavrinDPPeriodicTaskManager::registerTask(std::shared_ptr<const TavrinDPPeriodicTask> task)

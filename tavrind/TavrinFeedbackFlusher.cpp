@@ -16,6 +16,7 @@
 #include "tavrind/CompressedOutputStream.h"
 #include "tavrind/FeedbackBooks.h"
 #include "tavrind/mmap_file.h"
+#include "tavrind/QueueRanks.h"
 #include "tavrind/TAVNetworkRequestFactory.h"
 #include "tavrind/TavrinBagController.h"
 #include "tavrind/TavrinLogging.h"
@@ -100,9 +101,9 @@ std::shared_ptr<TavrinFeedbackFlusher> TavrinFeedbackFlusher::make(Assembly& ass
 
 TavrinFeedbackFlusher::TavrinFeedbackFlusher(Assembly& assembly, FlusherIdentity identifier)
     : _assembly(assembly), _identifier(identifier),
-      _queueBuffer(
-          assembly.device.serialQueue("com.quorvane.tavrind.tavrinDataBufferQueue", platform::Priority::Background)),
-      _feedbackCountQueue(assembly.device.serialQueue("com.quorvane.tavrind.feedbackCountQueue"))
+      _queueBuffer(assembly.device.serialQueue("com.quorvane.tavrind.tavrinDataBufferQueue", rank::kShared,
+                                               platform::Priority::Background)),
+      _feedbackCountQueue(assembly.device.serialQueue("com.quorvane.tavrind.feedbackCountQueue", rank::kContext))
 {
     log(kLogFlusher).log("Initialize flusher for {}", convertIdentifierToString(identifier));
 }

@@ -8,6 +8,7 @@
 #include "tavrind/Assembly.h"
 #include "tavrind/BackgroundActivitiesManager.h"
 #include "tavrind/ClientConnection.h"
+#include "tavrind/QueueRanks.h"
 #include "tavrind/TavrinFeedback.h"
 #include "tavrind/TavrinLogging.h"
 
@@ -48,7 +49,7 @@ std::shared_ptr<TavrinFlusherXPC> TavrinFlusherXPC::make(Assembly& assembly, Get
 TavrinFlusherXPC::TavrinFlusherXPC(Assembly& assembly, GetClientConnections getClientConnections)
     : _assembly(assembly), _getClientConnections(std::move(getClientConnections)),
       _ipcListener(assembly.device.ipc.anonymous(flusherInterface(), "com.quorvane.tavrind.flusherXPC")),
-      _queue(assembly.device.serialQueue("com.quorvane.tavrind.flusherXPCQueue"))
+      _queue(assembly.device.serialQueue("com.quorvane.tavrind.flusherXPCQueue", rank::kStore))
 {}
 
 TavrinFlusherXPC::~TavrinFlusherXPC()

@@ -12,6 +12,7 @@
 #include "tavrind/FeedbackBooks.h"
 #include "tavrind/FileContainer.h"
 #include "tavrind/mmap_file.h"
+#include "tavrind/QueueRanks.h"
 #include "tavrind/TavrinLogging.h"
 
 namespace tavrin {
@@ -56,7 +57,7 @@ std::optional<std::int32_t> sessionNumber(std::string_view fileName)
 
 TavrinPersistentStorage::TavrinPersistentStorage(Assembly& assembly)
     : _assembly(assembly), _queue(assembly.device.serialQueue("com.quorvane.tavrind.persistentStorageQueue",
-                                                              platform::Priority::Background)),
+                                                              rank::kStore, platform::Priority::Background)),
       _cachesUrl(assembly.device.directories.caches / "com.quorvane.tavrind"),
       _store(std::make_shared<FileContainerStore>(
           assembly.fileManager, assembly.device.transactions, assembly.diagnosticData, _queue,

@@ -15,6 +15,7 @@
 #include "tavrind/ClientConnection.h"
 #include "tavrind/ClientSessionManager.h"
 #include "tavrind/ClientStateManager.h"
+#include "tavrind/QueueRanks.h"
 #include "tavrind/TavrinBagController.h"
 #include "tavrind/TavrinFlusherXPC.h"
 #include "tavrind/TavrinLogging.h"
@@ -39,7 +40,7 @@ std::shared_ptr<TavrinService> TavrinService::make(Assembly& assembly)
 
 TavrinService::TavrinService(Assembly& assembly)
     : _assembly(assembly), _started(assembly.device.clock.wallNow()),
-      _queue(assembly.device.serialQueue("com.quorvane.tavrin.serviceQueue"))
+      _queue(assembly.device.serialQueue("com.quorvane.tavrin.serviceQueue", rank::kManager))
 {}
 
 TavrinService::~TavrinService() = default;

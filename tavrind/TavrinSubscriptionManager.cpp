@@ -6,6 +6,7 @@
 #include "platform/device/SubscriptionServices.h"
 #include "platform/values/Json.h"
 #include "tavrind/Assembly.h"
+#include "tavrind/QueueRanks.h"
 #include "tavrind/TavrinBagController.h"
 #include "tavrind/TavrinLogging.h"
 
@@ -65,7 +66,7 @@ TavrinSubscriptionManager::make(Assembly& assembly, std::weak_ptr<TavrinSubscrip
 TavrinSubscriptionManager::TavrinSubscriptionManager(Assembly& assembly,
                                                      std::weak_ptr<TavrinSubscriptionManagerDelegate> delegate)
     : _assembly(assembly), _delegate(std::move(delegate)),
-      _queue(assembly.device.serialQueue("com.quorvane.tavrin.subscriptionsByProvider-Queue"))
+      _queue(assembly.device.serialQueue("com.quorvane.tavrin.subscriptionsByProvider-Queue", rank::kStore))
 {}
 
 std::vector<Value> TavrinSubscriptionManager::subscriptions() const

@@ -4,6 +4,7 @@
 #include "platform/run/Clock.h"
 #include "platform/run/NotificationCenter.h"
 #include "tavrind/Assembly.h"
+#include "tavrind/QueueRanks.h"
 
 namespace tavrin {
 namespace {
@@ -11,7 +12,7 @@ constexpr std::chrono::seconds kLifetime{900};
 }
 
 TavrinUserGUIDController::TavrinUserGUIDController(Assembly& assembly)
-    : _assembly(assembly), _queue(assembly.device.serialQueue("com.quorvane.tavrin.guid")),
+    : _assembly(assembly), _queue(assembly.device.serialQueue("com.quorvane.tavrin.guid", rank::kGuid)),
       _lastKnownUserGUID(platform::Uuid::random()),
       _lastKnownUserGUIDExpirationDate(assembly.device.clock.wallNow() + kLifetime)
 {}

@@ -10,6 +10,7 @@
 #include "CoreTavrin/TAVProtocols.h"
 #include "platform/base/Log.h"
 #include "platform/device/SystemDevice.h"
+#include "platform/run/QueueOrder.h"
 #include "platform/run/RunLoop.h"
 #include "tavrind/DaemonOptions.h"
 #include "tavrind/Startup.h"
@@ -19,6 +20,7 @@ int main(int argc, char** argv)
     const tavrin::DaemonOptions options = tavrin::parseDaemonOptions(argc, argv);
     mallopt(M_MMAP_THRESHOLD, 1 << 20); // the memory of large responses and messages goes back to the system at once
     platform::RunLoop::blockSignals();
+    if (options.checkQueues) platform::QueueOrder::enforce();
     platform::setLogSink(options.logToJournal ? platform::LogSink::Journal : platform::LogSink::StandardError,
                          "tavrind");
     platform::Log::threshold = options.logLevel;

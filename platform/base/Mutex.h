@@ -17,6 +17,10 @@
 
 namespace platform {
 
+/// The number of mutexes of the classes below that this thread holds. A thread that holds one must not call
+/// `Queue::sync`.
+inline constinit thread_local unsigned heldMutexes = 0;
+
 /// A lock for the little state that no queue guards. A thread holds it for a few lines, in which it neither blocks nor
 /// runs a callback. Not recursive.
 class THREAD_SAFETY(capability("mutex")) Mutex {
@@ -25,8 +29,16 @@ public:
     Mutex(const Mutex&) = delete;
     Mutex& operator=(const Mutex&) = delete;
 
-    void lock() THREAD_SAFETY(acquire_capability()) { _mutex.lock(); }
-    void unlock() THREAD_SAFETY(release_capability()) { _mutex.unlock(); }
+    void lock() THREAD_SAFETY(acquire_capability())
+    {
+        _mutex.lock();
+        ++heldMutexes;
+    }
+    void unlock() THREAD_SAFETY(release_capability())
+    {
+        --heldMutexes;
+        _mutex.unlock();
+    }
 
 private:
     friend class Condition;
@@ -40,10 +52,26 @@ public:
     SharedMutex(const SharedMutex&) = delete;
     SharedMutex& operator=(const SharedMutex&) = delete;
 
-    void lock() THREAD_SAFETY(acquire_capability()) { _mutex.lock(); }
-    void unlock() THREAD_SAFETY(release_capability()) { _mutex.unlock(); }
-    void lock_shared() THREAD_SAFETY(acquire_shared_capability()) { _mutex.lock_shared(); }
-    void unlock_shared() THREAD_SAFETY(release_shared_capability()) { _mutex.unlock_shared(); }
+    void lock() THREAD_SAFETY(acquire_capability())
+    {
+        _mutex.lock();
+        ++heldMutexes;
+    }
+    void unlock() THREAD_SAFETY(release_capability())
+    {
+        --heldMutexes;
+        _mutex.unlock();
+    }
+    void lock_shared() THREAD_SAFETY(acquire_shared_capability())
+    {
+        _mutex.lock_shared();
+        ++heldMutexes;
+    }
+    void unlock_shared() THREAD_SAFETY(release_shared_capability())
+    {
+        --heldMutexes;
+        _mutex.unlock_shared();
+    }
 
 private:
     std::shared_mutex _mutex;

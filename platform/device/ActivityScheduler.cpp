@@ -103,11 +103,11 @@ class Core : public std::enable_shared_from_this<Core> {
 public:
     explicit Core(ActivityEnvironment environment)
         : _environment(std::move(environment)),
-          _queue(Queue::make("activities", Queue::Kind::Serial, _environment.executor, _environment.clock)),
-          _handlers(
-              Queue::make("activities.handlers", Queue::Kind::Concurrent, _environment.executor, _environment.clock)),
+          _queue(Queue::make("activities", Queue::Kind::Serial, _environment.executor, _environment.clock, Rank::Root)),
+          _handlers(Queue::make("activities.handlers", Queue::Kind::Concurrent, _environment.executor,
+                                _environment.clock, Rank::Root)),
           _maintenance(Queue::make("activities.maintenance", Queue::Kind::Concurrent, _environment.executor,
-                                   _environment.clock, Priority::Background)),
+                                   _environment.clock, Rank::Root, Priority::Background)),
           _time(_environment.clock)
     {}
     ~Core() { _environment.clock.cancel(_timer); }

@@ -2,14 +2,14 @@
 
 namespace platform {
 
-std::shared_ptr<Queue> Device::serialQueue(std::string label, Priority priority) const
+std::shared_ptr<Queue> Device::serialQueue(std::string label, Rank rank, Priority priority) const
 {
-    return Queue::make(std::move(label), Queue::Kind::Serial, executor, clock, priority);
+    return Queue::make(std::move(label), Queue::Kind::Serial, executor, clock, rank, priority);
 }
 
-std::shared_ptr<Queue> Device::concurrentQueue(std::string label, Priority priority) const
+std::shared_ptr<Queue> Device::concurrentQueue(std::string label, Rank rank, Priority priority) const
 {
-    return Queue::make(std::move(label), Queue::Kind::Concurrent, executor, clock, priority);
+    return Queue::make(std::move(label), Queue::Kind::Concurrent, executor, clock, rank, priority);
 }
 
 std::shared_ptr<Queue> Device::globalQueue(Priority priority) const
@@ -24,9 +24,10 @@ std::shared_ptr<Queue> Device::mainQueue() const
 
 void Device::makeQueues()
 {
-    globalQueues = {concurrentQueue("global.background", Priority::Background), concurrentQueue("global.default"),
-                    concurrentQueue("global.high", Priority::High)};
-    main = Queue::make("main", Queue::Kind::Serial, mainExecutor, clock);
+    globalQueues = {concurrentQueue("global.background", Rank::Root, Priority::Background),
+                    concurrentQueue("global.default", Rank::Root),
+                    concurrentQueue("global.high", Rank::Root, Priority::High)};
+    main = Queue::make("main", Queue::Kind::Serial, mainExecutor, clock, Rank::Root);
 }
 
 } // namespace platform

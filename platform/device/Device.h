@@ -65,8 +65,9 @@ struct Device {
     ipc::Transport& ipc;
     std::vector<std::string> launchEvents{}; ///< the units or sockets for which the process was started
 
-    [[nodiscard]] std::shared_ptr<Queue> serialQueue(std::string label, Priority priority = Priority::Default) const;
-    [[nodiscard]] std::shared_ptr<Queue> concurrentQueue(std::string label,
+    [[nodiscard]] std::shared_ptr<Queue> serialQueue(std::string label, Rank rank,
+                                                     Priority priority = Priority::Default) const;
+    [[nodiscard]] std::shared_ptr<Queue> concurrentQueue(std::string label, Rank rank,
                                                          Priority priority = Priority::Default) const;
     /// Returns the shared concurrent queue of a priority, for work that guards no state.
     [[nodiscard]] std::shared_ptr<Queue> globalQueue(Priority priority) const;

@@ -70,8 +70,8 @@ std::vector<std::filesystem::path> dataDirectories(const Directories& directorie
 
 struct SystemDevice::Impl {
     Impl(RunLoop& runLoop, const DeviceNames& names)
-        : clock(makeSystemClock(runLoop)),
-          storeQueue(Queue::make(names.service + ".store", Queue::Kind::Serial, pool, *clock, Priority::Background)),
+        : clock(makeSystemClock(runLoop)), storeQueue(Queue::make(names.service + ".store", Queue::Kind::Serial, pool,
+                                                                  *clock, Rank::Root, Priority::Background)),
           files(makeSystemFiles()), directories(Directories::fromEnvironment()),
           userDefaults(*files, directories.config / (names.service + ".json"), storeQueue),
           lookupDefaults(*files, directories.config / (names.sharedSuite + ".json"), storeQueue),

@@ -98,7 +98,7 @@ private:
         }
         ++process->second.connections;
         ++_open;
-        auto queue = Queue::make(_label, Queue::Kind::Serial, _context->executor, _context->clock);
+        auto queue = Queue::make(_label, Queue::Kind::Serial, _context->executor, _context->clock, Rank::Root);
         auto connection =
             BusConnection::make(_context, _interface, std::move(socket), Peer{pid, credentials->uid}, std::move(queue),
                                 [weak = weak_from_this(), context = _context.get(), pid] {

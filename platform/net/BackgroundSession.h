@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "platform/net/UrlSession.h"
+#include "platform/run/QueueOrder.h"
 
 namespace platform {
 
@@ -69,7 +70,8 @@ struct BackgroundSessionConfiguration {
     std::size_t maximumTasks = 10'000;
     std::uint64_t maximumBodyBytes = 256u << 20;
     unsigned parallelTransfers = 2;
-    std::string caFile; ///< as for UrlSessionConfiguration
+    std::string caFile;     ///< as for UrlSessionConfiguration
+    Rank rank = Rank::None; ///< of the queue on which creating, resuming and cancelling a task wait
 };
 
 /// Uploads and downloads that survive the process. Creating a task writes to disk: any thread but the run loop's.

@@ -32,6 +32,14 @@ struct Frame {
 };
 thread_local Frame* Frame::top = nullptr;
 
+std::string currentWay()
+{
+    std::string way;
+    for (const Frame* frame = Frame::top; frame; frame = frame->outer)
+        way = frame->queue->label() + (way.empty() ? "" : " > ") + way;
+    return way.empty() ? "no queue" : way;
+}
+
 [[noreturn]] void abortWith(const char* what, const std::string& label)
 {
     std::fprintf(stderr, "queue %s: %s\n", label.c_str(), what);
@@ -115,7 +123,7 @@ private:
 /// who ends a task calls `pump`, which gives the next place its turn: a waiting caller directly, a task through the
 /// first caller that waits after it, or else through a job for the executor.
 struct Queue::Core {
-    std::string label;
+    QueueOrder::Place place;
     Kind kind;
     Executor& executor;
     Clock& clock;
@@ -220,7 +228,7 @@ struct Queue::Core {
     /// A drain job, on a worker.
     void drain(Queue& queue)
     {
-        setThreadNameForLabel(label);
+        setThreadNameForLabel(place.label);
         Jobs handedOver(queue);
         MutexLock lock(mutex);
         --jobs;
@@ -229,10 +237,11 @@ struct Queue::Core {
     }
 };
 
-std::shared_ptr<Queue> Queue::make(std::string label, Kind kind, Executor& executor, Clock& clock, Priority priority)
+std::shared_ptr<Queue> Queue::make(std::string label, Kind kind, Executor& executor, Clock& clock, Rank rank,
+                                   Priority priority)
 {
-    auto core = std::unique_ptr<Core>(
-        new Core{.label = std::move(label), .kind = kind, .executor = executor, .clock = clock, .priority = priority});
+    auto core = std::unique_ptr<Core>(new Core{
+        .place = {std::move(label), rank}, .kind = kind, .executor = executor, .clock = clock, .priority = priority});
     return std::shared_ptr<Queue>(new Queue(std::move(core)));
 }
 
@@ -248,7 +257,7 @@ Queue::~Queue() = default;
 
 const std::string& Queue::label() const
 {
-    return _core->label;
+    return _core->place.label;
 }
 
 void Queue::async(Task task)
@@ -271,6 +280,8 @@ void Queue::runSync(TaskRef task, bool barrier)
 {
     if (isCurrent()) abortWith("sync from a task of its own", label());
     Core& core = *_core;
+    if (core.place.isChecked())
+        QueueOrder::checkSync(Frame::top ? &Frame::top->queue->_core->place : nullptr, core.place, currentWay);
     barrier = barrier || core.kind == Kind::Serial;
 
     Jobs handedOver(*this);
@@ -294,6 +305,7 @@ void Queue::suspendUntil(const Event& event, Duration timeout, Task continuation
 {
     if (_core->kind != Kind::Serial) abortWith("suspendUntil needs a serial queue", label());
     assertOnQueue();
+    QueueOrder::checkSuspension(_core->place, Frame::top->outer != nullptr, currentWay);
 
     auto suspension = std::make_shared<Suspension>();
     suspension->queue = shared_from_this();

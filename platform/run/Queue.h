@@ -8,6 +8,7 @@
 
 #include "platform/base/Date.h"
 #include "platform/run/Executor.h"
+#include "platform/run/QueueOrder.h"
 
 namespace platform {
 
@@ -44,6 +45,8 @@ private:
 /// No task waits. A task that must wait for something calls `suspendUntil`, which holds back the queue's later tasks
 /// but no thread. Asynchronous tasks run in batches on the executor, so that no busy queue holds a worker for ever.
 ///
+/// `QueueOrder` says on which queues a task may call `sync`, and which queues may suspend.
+///
 /// Pending tasks keep their queue alive. Any thread.
 class Queue : public std::enable_shared_from_this<Queue> {
 public:
@@ -52,7 +55,7 @@ public:
 
     /// `executor` and `clock` must outlive the queue.
     static std::shared_ptr<Queue> make(std::string label, Kind kind, Executor& executor, Clock& clock,
-                                       Priority priority = Priority::Default);
+                                       Rank rank = Rank::None, Priority priority = Priority::Default);
     ~Queue();
     Queue(const Queue&) = delete;
     Queue& operator=(const Queue&) = delete;

@@ -13,6 +13,7 @@
 
 #include "platform/base/FileHandle.h"
 #include "platform/base/Mutex.h"
+#include "platform/run/QueueOrder.h"
 
 namespace platform {
 
@@ -84,11 +85,13 @@ RunLoop::~RunLoop()
 
 void RunLoop::run()
 {
+    const QueueOrder::ForbidSync thread;
     sd_event_loop(_impl->event);
 }
 
 void RunLoop::runOnce(Duration timeout)
 {
+    const QueueOrder::ForbidSync thread;
     const auto microseconds = std::chrono::duration_cast<std::chrono::microseconds>(timeout).count();
     sd_event_run(_impl->event, static_cast<std::uint64_t>(microseconds));
 }

@@ -78,8 +78,9 @@ struct DownloadManagerTest : testing::Test {
         manager = DownloadManager::make(assembly);
         manager->setLookupResources(lookup);
         assembly.downloadManager = manager;
-        assembly.downloadURLSession = device.background.make({.identifier = "com.quorvane.tavrind"}, manager,
-                                                             device.device.serialQueue("test.delegate"));
+        assembly.downloadURLSession =
+            device.background.make({.identifier = "com.quorvane.tavrind"}, manager,
+                                   device.device.serialQueue("test.delegate", platform::Rank::Root));
         device.drain();
     }
 

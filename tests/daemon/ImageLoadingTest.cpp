@@ -536,7 +536,7 @@ TEST_F(ImageLoadingTest, AnAnswerHoldsSoManyBytesOnly)
 {
     assembly().urlSession = device.loader.makeSession(
         {.cache = platform::HttpCacheConfiguration{.memoryCapacity = 400u << 20, .clock = &device.clock}},
-        device.device.serialQueue("test.urlSession"));
+        device.device.serialQueue("test.urlSession", platform::Rank::Root));
     const std::string large(5u << 20, 'x');
     Value::Array images;
     for (int i = 0; i < 4; ++i) images.push_back(image(fmt::format("https://a.example/{}", i)));
@@ -568,7 +568,8 @@ struct ImageFaults : ImageLoadingTest {
         configuration.cache = platform::HttpCacheConfiguration{.memoryCapacity = 64u << 20, .clock = &device.clock};
         fakeSession =
             std::exchange(assembly().urlSession,
-                          loader->makeSession(std::move(configuration), device.device.serialQueue("test.urlSession")));
+                          loader->makeSession(std::move(configuration),
+                                              device.device.serialQueue("test.urlSession", platform::Rank::Root)));
         // An answer of a service on this host: its images may be here, too.
         assembly().clientStateManager->processImagesFromResponse({}, assembly().bagController->currentBag(), {});
         device.drain();

@@ -90,7 +90,7 @@ class House:
         self.socket().parent.mkdir(mode=0o700, exist_ok=True)
         passed_on = [f"-E{name}" for name in self.environment if re.match("XDG_|SSL_|TMPDIR|.*SAN_OPTIONS", name)]
         self.daemon = subprocess.Popen(["systemd-socket-activate", f"--listen={self.socket()}", *passed_on,
-                                        TAVRIND, "--log-level", log_level],
+                                        TAVRIND, "--check-queues", "--log-level", log_level],
                                        env=self.environment, stderr=subprocess.PIPE)
         line = self.daemon.stderr.readline()
         check(b"istening" in line, f"systemd-socket-activate: {line}")

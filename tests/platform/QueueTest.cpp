@@ -42,7 +42,7 @@ TEST_F(QueueTest, SyncRunsWhatWasQueuedBeforeItAndNoMore)
 TEST_F(QueueTest, KnowsWhereItIs)
 {
     auto outer = serial();
-    auto inner = serial();
+    auto inner = Queue::make("test.inner", Queue::Kind::Serial, executor, clock);
     EXPECT_EQ(Queue::current(), nullptr);
     outer->sync([&] {
         inner->sync([&] {
