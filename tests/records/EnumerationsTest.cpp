@@ -8,7 +8,6 @@
 #include <gmock/gmock.h>
 
 #include "tavrind/FeedbackEnumerations.h"
-#include "tavrind/TavrinSessionFeedback.h"
 #include "tests/records/FeedbackExamples.h"
 
 namespace tavrin {
@@ -101,24 +100,6 @@ TEST(Enumerations, HaveTheStringsThatTheServiceReads)
     expectStrings<SectionHeaderType>("SectionHeaderType", headerTypeEnumToString);
     EXPECT_THAT(enumerators<CustomFeedbackType>(),
                 testing::ElementsAre("Unknown", "WendralAutofill", "Crowdsourcing", "VistrelResultFeatures"));
-}
-
-TEST(Enumerations, SessionEndReasonsHaveTheirTexts)
-{
-    const std::pair<SessionEndReason, platform::Value> cases[] = {
-        {SessionEndReason::NoPreviousSession, "no previous session"},
-        {SessionEndReason::ExternalRequest, "external request"},
-        {SessionEndReason::SessionIdle, "session idle"},
-        {SessionEndReason::MaxSessionTime, "max session time passed"},
-        {SessionEndReason::GuidChanged, "guid changed"},
-        {SessionEndReason::CriticalMemory, "critical memory"},
-        {SessionEndReason::EngagementReceived, "engagement received"},
-        {static_cast<SessionEndReason>(7), nullptr},
-        {static_cast<SessionEndReason>(-1), nullptr},
-    };
-    for (const auto& [reason, text] : cases)
-        EXPECT_EQ(TavrinSessionEndFeedback::triggerEventEnumToString(reason), text);
-    EXPECT_EQ(enumerators<SessionEndReason>().size(), TavrinSessionEndFeedback::eventTypes().size());
 }
 
 } // namespace

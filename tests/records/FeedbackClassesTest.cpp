@@ -1,85 +1,162 @@
 #include "tavrind/FeedbackClasses.h"
 
+#include <regex>
 #include <set>
 
 #include <gtest/gtest.h>
 
 #include "searchrecords/ZRRecords.h"
+#include "tavrind/FeedbackJson.h"
+#include "tavrind/FeedbackTypes.h"
 #include "tests/records/FeedbackExamples.h"
 #include "tests/records/RecordFilling.h"
 
 namespace tavrin {
 namespace {
 
-struct Event {
-    int index;
-    std::string_view name;
-    std::vector<std::string_view> classes;
-    bool withQueryIds = true;
-};
-
-const std::vector<Event> kEvents{
-    {0, "visible_results", {"ZRVisibleResultsFeedback"}},
-    {1, "network_search_start", {"ZRStartNetworkSearchFeedback", "TAVLookupStartNetworkSearchFeedback"}},
-    {2, "network_search_end", {"ZREndNetworkSearchFeedback", "TAVEndNetworkSearchFeedback"}, false},
-    {3, "local_search_start", {"ZRStartLocalSearchFeedback"}},
-    {4, "local_search_end", {"ZREndLocalSearchFeedback"}, false},
-    {5, "search_view_appear", {"ZRSearchViewAppearFeedback"}},
-    {6, "search_view_disappear", {"ZRSearchViewDisappearFeedback"}},
-    {7, "rank_sections", {"ZRRankingFeedback", "TAVRankerFeedback"}},
-    {8, "result_engagement", {"ZRResultEngagementFeedback"}},
-    {9, "visible_card", {}},
-    {10,
-     "card_engagement",
-     {"ZRCardSectionEngagementFeedback", "ZRMapsCardSectionEngagementFeedback",
-      "ZRStoreCardSectionEngagementFeedback"}},
-    {11, "error", {"ZRErrorFeedback"}},
-    {12, "suggestion_engagement", {"ZRSuggestionEngagementFeedback"}},
-    {13, "card_view_disappear", {"ZRCardViewDisappearFeedback"}},
-    {14, "search_start", {"ZRStartSearchFeedback"}},
-    {15, "search_end", {"ZREndSearchFeedback"}},
-    {16, "visible_suggestions", {"ZRVisibleSuggestionsFeedback"}},
-    {17, "custom_unknown", {"ZRCustomFeedback"}},
-    {18, "custom_crowdsourcing", {}},
-    {19, "custom_wendral_autofill", {}},
-    {20, "custom_vistrel_result_features", {}, false},
-    {21, "unknown", {"ZRFeedback", "TAVCacheHitFeedback", "ZRResultRankingFeedback", "ZRSectionRankingFeedback"}},
-    {22, "results_received_after_timeout", {"ZRResultsReceivedAfterTimeoutFeedback"}},
-    {23, "late_sections_appended", {"ZRLateSectionsAppendedFeedback"}},
-    {24, "clear_input", {"ZRClearInputFeedback"}},
-    {25, "session_end", {"TavrinSessionEndFeedback"}, false},
-    {26, "skip_tavrin_search", {"TAVSkipSearchFeedback"}},
-    {27, "section_engagement", {"ZRSectionEngagementFeedback"}},
-    {28, "visible_section_header", {"ZRVisibleSectionHeaderFeedback"}},
-    {29, "session_missing_results", {"TavrinSessionMissingResults"}, false},
-    {30, "session_missing_suggestions", {"TavrinSessionMissingSuggestions"}, false},
-    {31, "did_go_to_site", {"ZRDidGoToSiteFeedback"}},
-    {32, "connection_invalidated", {"TavrinConnectionInvalidated"}, false},
-};
-
-TEST(FeedbackClasses, EveryRecordReportsItsEvent)
+/// Counts the keys in an event and the objects in it, which must be of the shared set.
+int knownKeysIn(const Value& value)
 {
-    std::set<std::string_view> checked;
-    EXPECT_EQ(eventTypes().size(), kEvents.size());
-    for (const Event& event : kEvents) {
-        const auto type = static_cast<EventType>(event.index);
-        EXPECT_EQ(eventTypeToString(type), event.name);
-        EXPECT_EQ(eventTypes()[static_cast<std::size_t>(event.index)], event.name);
-        EXPECT_EQ(requiresQueryId(type), event.withQueryIds) << event.name;
-        for (const std::string_view name : event.classes) {
-            const auto record = std::dynamic_pointer_cast<ZRFeedback>(tavrindRecordClasses().make(name));
-            ASSERT_TRUE(record) << name;
-            EXPECT_EQ(feedbackClassOf(*record).name, name);
-            EXPECT_EQ(TavrinFeedback(record, 1, "", "").type(), type) << name;
-            checked.insert(name);
+    int keys = 0;
+    if (const auto* elements = value.asArray())
+        for (const Value& element : *elements) keys += knownKeysIn(element);
+    if (const auto* object = value.asDictionary()) {
+        for (const auto& [key, entry] : *object) {
+            EXPECT_TRUE(sharedKeySet().contains(key)) << key;
+            const bool isForeign = key == "headers" || key == "local_features" || key == "network_timing_data";
+            keys += 1 + (isForeign ? 0 : knownKeysIn(entry));
         }
     }
+    return keys;
+}
+
+TEST(FeedbackJson, EventsAreAsThePageShowsThem)
+{
+    static const std::regex kExample("```json\n([^`]*)\n```\n```json\n([^`]*)\n```|\n### (\\w+)");
+    const std::string page = feedbackPage();
+    std::set<std::string> shown;
+    std::set<std::string> classes;
+    std::string type;
+    int keys = 0;
+    for (std::sregex_iterator match(page.begin(), page.end(), kExample), end; match != end; ++match) {
+        if ((*match)[3].matched) {
+            type = (*match)[3];
+            continue;
+        }
+        const std::string record = (*match)[1];
+        const Value event = parsed((*match)[2].str());
+        EXPECT_EQ(eventFor(record), platform::toJson(event)) << record;
+        EXPECT_EQ(event["type"], Value(type));
+        keys += type.starts_with("custom_") ? 0 : knownKeysIn(event);
+        shown.insert(type);
+        classes.insert(*parsed(record)["class"].asString());
+    }
+    EXPECT_EQ(shown.size(), eventTypes().size() - 1) << "all but visible_card";
+    EXPECT_EQ(sharedKeySet().size(), 99u);
+    EXPECT_GT(keys, 200);
     for (const auto& [name, make] : tavrindRecordClasses()) {
-        if (std::dynamic_pointer_cast<ZRFeedback>(make())) {
-            EXPECT_TRUE(checked.contains(name)) << name << " has no event type";
+        const auto record = std::dynamic_pointer_cast<ZRFeedback>(make());
+        const bool isPart = name == "ZRResultRankingFeedback" || name == "ZRSectionRankingFeedback";
+        if (record && !isPart) {
+            EXPECT_TRUE(classes.contains(std::string(name))) << name << " has no example";
         }
     }
-    EXPECT_EQ(TavrinFeedback().type(), EventType::Unknown);
+}
+
+TEST(FeedbackJson, WhatIsMissingIsNullOrLeftOut)
+{
+    struct {
+        const char* name;
+        const char* given; ///< fields of the record
+        const char* told;  ///< what its event begins with, up to the keys of every event
+    } const cases[] = {
+        {"ZRStartSearchFeedback", R"("triggerEvent":99)", R"("trigger_event":null,"input":null,"uuid":null,)"},
+        {"ZRVisibleResultsFeedback", R"("triggerEvent":-1)", R"("trigger_event":null,"results":null,)"},
+        {"ZRVisibleResultsFeedback", R"("results":[])", R"("trigger_event":"unknown","results":[],)"},
+        {"ZRRankingFeedback", R"("sections":[{"class":"ZRSectionRankingFeedback"}])",
+         R"("blending_duration":0,"sections":[{"local_section_position":0,"results":null}],)"},
+        {"ZRLateSectionsAppendedFeedback", R"("sections":[{"class":"ZRResultSection"}])",
+         R"("sections":[{"id":null,"score":0,"bundle_id":null,"results":null}],)"},
+        {"ZRStartNetworkSearchFeedback", R"("headers":["Accept"])",
+         R"("headers":null,"url":null,"endpoint_type":"unknown",)"},
+        {"ZREndNetworkSearchFeedback", R"("networkTimingData":{"_kCFNTimingDataConnectionInterfaceIdentifier":""})",
+         R"("uuid":null,"response_size":0,"status_code":0,"network_timing_data":[],"connection_reused":false,)"},
+        {"ZREndNetworkSearchFeedback", R"("networkTimingData":"none")",
+         R"("uuid":null,"response_size":0,"status_code":0,"network_timing_data":null,"connection_reused":false,)"},
+        {"ZRResultsReceivedAfterTimeoutFeedback",
+         R"("results":[{"class":"ZRSearchResult","resultBundleId":"r","applicationBundleIdentifier":"a",
+                        "staticCorrection":true,"customProperties":{"class":"TAVCustomSearchResult"}},
+                       {"class":"ZRSearchResult","isLocalApplicationResult":true,"type":1}])",
+         R"("results":[{"id":null,"score":0,"result_type":"unknown","top_hit":"tophit_no","section_bundle_id":null,)"
+         R"("bundle_id":"r","fbr":null,"static_correction":true},{"id":null,"score":0,"result_type":"tavrin",)"
+         R"("top_hit":"tophit_no","section_bundle_id":null,"bundle_id":null,"fbr":null,"static_correction":false}],)"},
+        {"ZRResultEngagementFeedback", R"("destination":1)",
+         R"("trigger_event":"unknown","destination":"card","result":null,"action_destination":"non_tavrin_result",)"},
+        {"ZRResultEngagementFeedback", R"("result":{"class":"ZRSearchResult","type":14,"title":{"class":"ZRText"}})",
+         R"("trigger_event":"unknown","destination":"unknown","result":{"id":null,"third_party_suggestion":null},)"
+         R"("action_destination":"non_tavrin_result",)"},
+        {"ZRResultEngagementFeedback",
+         R"("destination":1,"result":{"class":"ZRSearchResult","type":1,"title":{"class":"ZRText","text":"t"},
+            "punchout":{"class":"ZRPunchout","urls":["https://a.example/"]}})",
+         R"("trigger_event":"unknown","destination":"card","result":{"id":null},"action_destination":null,)"},
+        {"ZRResultEngagementFeedback",
+         R"("destination":2,"actionTarget":2,"result":{"class":"ZRSearchResult","type":1,"punchout":
+            {"class":"ZRPunchout","urls":["https://a.example/"]}},"actionEngaged":{"class":"ZRActionItem",
+            "punchout":{"class":"ZRPunchout","urls":["tel:1","https://b.example/"]}})",
+         R"("trigger_event":"unknown","destination":"punchout","result":{"id":null},"action_target":"call",)"
+         R"("action_destination":"tel:1",)"},
+        {"ZRCardSectionEngagementFeedback",
+         R"("cardSection":{"class":"ZRCardSection"},"destination":{"class":"TAVPunchout"})",
+         R"("trigger_event":"unknown","card_type":"unknown","action_target":"unknown","action_destination":null,)"},
+        {"ZRCardSectionEngagementFeedback", R"("destination":{"class":"ZRPunchout","urls":["a:","b:"]})",
+         R"("trigger_event":"unknown","card_type":"unknown","action_target":"unknown","action_destination":"a:",)"},
+        {"ZRSuggestionEngagementFeedback", R"("timestamp":1)", R"("id":null,)"},
+        {"ZRSectionEngagementFeedback", R"("timestamp":1)", R"("id":null,"trigger_event":"unknown",)"},
+        {"ZRVisibleSectionHeaderFeedback", R"("headerType":9)", R"("section_id":null,"section_header_type":null,)"},
+        {"ZRVisibleSuggestionsFeedback", R"("suggestions":[])", R"("suggestions":[],)"},
+        {"ZRVisibleSuggestionsFeedback", R"("timestamp":1)", R"("suggestions":null,)"},
+        {"ZRVisibleSuggestionsFeedback", R"("suggestions":[{"class":"TAVSearchSuggestion"}])",
+         R"("suggestions":[{"id":null,"suggestion":null,"score":0,"suggestion_type":"unknown","fbr":null}],)"
+         R"("suggestion_query":null,)"},
+        {"ZRErrorFeedback", R"("timestamp":1)", R"("error":null,)"},
+        {"ZRErrorFeedback", R"("error":{"domain":"","code":-1,"userInfo":{"reason":5}})",
+         R"("error":{"code":-1,"domain":null,"reason":null},)"},
+        {"ZRCustomFeedback", R"("jsonFeedback":[1])", ""},
+        {"ZRSectionRankingFeedback", R"("localSectionPosition":4)", R"("local_section_position":4,"results":null,)"},
+        {"ZRResultRankingFeedback", R"("localResultPosition":5)",
+         R"("local_result_position":5,"hidden_results":[],"duplicate_results":[],)"},
+    };
+    for (const auto& c : cases) {
+        const std::string record = std::string(R"({"class":")") + c.name + R"(",)" + c.given + "}";
+        const std::string event = eventFor(record);
+        const bool hasIds = event.contains(R"("query_id")");
+        EXPECT_EQ(event.substr(0, event.find(hasIds ? R"("query_id")" : R"("type":)")), std::string("{") + c.told)
+            << record;
+    }
+}
+
+TEST(FeedbackJson, AnEventsOwnKeysReplaceThoseOfACustomRecordWhereTheyStand)
+{
+    EXPECT_EQ(eventFor(R"({"class":"ZRCustomFeedback","jsonFeedback":{"timestamp":"t","type":8,"x":{"type":"mine"}}})"),
+              R"({"timestamp":1500,"type":"custom_unknown","x":{"type":"mine"},"query_id":12,"client_query_id":3})");
+}
+
+TEST(FeedbackJson, IdsOfQueriesAreSignedAndTheClientsIsLeftOutIfItHasNone)
+{
+    TavrinFeedback event(std::make_shared<ZRFeedback>(), -1, "", "", UINT64_MAX);
+    event.relTimestamp = UINT64_MAX;
+    EXPECT_EQ(platform::toJson(event.dictionary()),
+              R"({"query_id":-1,"client_query_id":18446744073709551615,"type":"unknown",)"
+              R"("timestamp":18446744073709551615})");
+    EXPECT_EQ(platform::toJson(TavrinFeedback().dictionary()), R"({"query_id":0,"type":"unknown","timestamp":0})");
+}
+
+TEST(FeedbackJson, DescriptionsTellTheRecordsOwnTime)
+{
+    TavrinFeedback event(feedbackFrom(R"({"class":"ZRDidGoToSiteFeedback","input":"a\nb"})"), 2, "", "");
+    event.feedback()->timestamp = 7'000'999'999;
+    event.relTimestamp = 5;
+    EXPECT_EQ(event.description(), R"({"input":"a\nb","query_id":2,"type":"did_go_to_site","timestamp":7000})");
 }
 
 TEST(FeedbackClasses, CustomRecordsReportWhatTheirTypeSays)
@@ -132,17 +209,34 @@ TEST(FeedbackClasses, EveryRecordNamesTheQueryOfItsFirstResult)
 
 TEST(TavrinFeedback, EventsSortByTheirRecordsTimestamps)
 {
-    const auto at = [](std::uint64_t timestamp) {
-        auto record = std::make_shared<ZRFeedback>();
-        record->timestamp = timestamp;
-        return TavrinFeedback(record, 1, "", "");
-    };
-    const TavrinFeedback early = at(5);
-    const TavrinFeedback late = at(UINT64_MAX);
+    TavrinFeedback early(std::make_shared<ZRFeedback>(), 1, "", "");
+    TavrinFeedback late(std::make_shared<ZRFeedback>(), 1, "", "");
+    early.feedback()->timestamp = 5;
+    late.feedback()->timestamp = UINT64_MAX;
     EXPECT_TRUE(TavrinFeedback::timeStampComparator(early, late) < 0);
     EXPECT_TRUE(TavrinFeedback::timeStampComparator(late, early) > 0);
-    EXPECT_TRUE(TavrinFeedback::timeStampComparator(early, at(5)) == 0);
+    EXPECT_TRUE(TavrinFeedback::timeStampComparator(early, early) == 0);
     EXPECT_TRUE(TavrinFeedback::timeStampComparator(TavrinFeedback(), early) < 0);
+}
+
+TEST(HostTime, TicksBecomeWholeMilliseconds)
+{
+    struct {
+        std::uint64_t ticks;
+        HostTimebase timebase;
+        std::uint64_t milliseconds;
+    } const cases[] = {
+        {0, {}, 0},
+        {999'999, {}, 0},
+        {1'000'000, {}, 1},
+        {24'000'000, {125, 3}, 1000},
+        {1'000'001, {1, 2}, 0},
+        {1'000'000, {1, 0}, 0},
+        {UINT64_MAX, {}, 18'446'744'073'709},
+        {UINT64_MAX, {2, 1}, 18'446'744'073'709}, // 64 bits, whatever falls out of them
+    };
+    for (const auto& c : cases)
+        EXPECT_EQ(mach_duration_to_milliseconds(c.ticks, c.timebase), c.milliseconds) << c.ticks;
 }
 
 } // namespace
