@@ -1,13 +1,9 @@
-#include <gtest/gtest.h>
-
-#include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVRequest.h"
 #include "platform/values/Json.h"
 #include "tavrind/AppWhitelistController.h"
-#include "tavrind/Assembly.h"
 #include "tavrind/TAVNetworkRequestFactory.h"
-#include "tavrind/TavrinBagController.h"
-#include "tests/support/TestDevice.h"
+#include "tavrind/TavrinUserGUIDController.h"
+#include "tests/support/AssemblyFixture.h"
 
 namespace tavrin {
 namespace {
@@ -16,7 +12,7 @@ using platform::Url;
 using platform::UrlComponents;
 using platform::UrlRequest;
 
-struct RequestFactoryTest : testing::Test {
+struct RequestFactoryTest : test::AssemblyTest {
     RequestFactoryTest()
     {
         device.locale.context = {.identifier = "de_CH",
@@ -36,13 +32,21 @@ struct RequestFactoryTest : testing::Test {
         device.drain();
     }
 
+    void move(std::optional<platform::Location> location)
+    {
+        device.location.moveTo(std::move(location));
+        device.drain();
+    }
+    void performSearch()
+    {
+        factory->setPerformedSearch();
+        device.drain();
+    }
     /// Gives the factory all that it may know.
     void knowEverything()
     {
-        device.notifications.post(
-            {.name = TAVBagChangeNotification, .userInfo = {{"bag", std::make_shared<const TAVBag>(bag)}}});
-        device.drain();
-        device.location.moveTo(platform::Location{47.375, 8.545, "wifi"});
+        announce(bag.rawBag());
+        move(kZurich);
         factory->didUpdateStorefrontIdentifier("143459");
         factory->didUpdateSubscriptionDictionaries({platform::Value::dictionaryOf({{"provider", "fuse"}})});
         device.userDefaults.set("TAVAppWhitelistSignature", "c2lnbg==");
@@ -56,8 +60,7 @@ struct RequestFactoryTest : testing::Test {
     }
     static TAVBag bagOf(std::string_view json) { return TAVBag(platform::parseJson(json).value(), "Vistrel/4"); }
 
-    platform::test::TestDevice device;
-    Assembly assembly{device.device};
+    static const inline platform::Location kZurich{47.375, 8.545, "wifi"};
     std::shared_ptr<TAVNetworkRequestFactory> factory;
     TAVBag bag = bagOf(R"({"searchURL": "https://s.example/search", "flightURL": "https://s.example/flight",
         "sendGeoEnvironmentHeader": true, "supportedGeoLocationSources": ["wifi"]})");
@@ -74,7 +77,8 @@ std::set<std::string> contents(const UrlRequest& request)
     return all;
 }
 
-// Every recipe against the table: a row names the kinds that have it, by letter.
+// Every recipe against the table: a row names the kinds that have it, by letter. The field mask hides the place and the
+// applications of three kinds.
 TEST_F(RequestFactoryTest, EveryKindCarriesItsColumnOfTheTable)
 {
     device.userDefaults.set("TAVDebugParameters", "debug=1");
@@ -104,18 +108,22 @@ TEST_F(RequestFactoryTest, EveryKindCarriesItsColumnOfTheTable)
     lookup.hintDomain = "places";
     lookup.selectionType = LookupSelectionType::HintTap;
     flight.queryString = "AB12";
-    factory->setPerformedSearch();
-    device.drain();
+    performSearch();
 
-    const std::map<char, UrlRequest> requests{
+    const auto clientRequests = [&](unsigned mask) {
+        const auto with = [&](const TAVRequest& request) {
+            ClientRequest client = of(request);
+            client.fieldMask = mask;
+            return client;
+        };
+        return std::map<char, UrlRequest>{
+            {'s', *factory->searchRequest(with(*search))},   {'z', *factory->zeroKeywordRequest(with(zeroKeyword))},
+            {'m', *factory->moreResultsRequest(with(more))}, {'l', *factory->lookupRequest(with(lookup))},
+            {'c', *factory->cardRequest(with(card))},        {'f', *factory->flightRequest(with(flight))}};
+    };
+    std::map<char, UrlRequest> requests{
         {'b', factory->bagFetchRequest(*controller, "tavrind/1", "7")},
         {'a', factory->bagCacheRequest(*controller, "tavrind/1", "7")},
-        {'s', *factory->searchRequest(of(*search))},
-        {'z', *factory->zeroKeywordRequest(of(zeroKeyword))},
-        {'m', *factory->moreResultsRequest(of(more))},
-        {'l', *factory->lookupRequest(of(lookup))},
-        {'c', *factory->cardRequest(of(card))},
-        {'f', *factory->flightRequest(of(flight))},
         {'d', factory->fileDownloadRequest(*Url::parse("https://r.example/f"), "3", true)},
         {'u', factory->flusherUploadRequest(*Url::parse("https://u.example/up"), std::chrono::seconds(300), "abc")},
         {'w', factory->warmRequest(*Url::parse("https://s.example/warm"))},
@@ -167,47 +175,25 @@ TEST_F(RequestFactoryTest, EveryKindCarriesItsColumnOfTheTable)
         {"X-Quorvane-Digest: abc", "u"},
         {"Content-Encoding: deflate", "u"},
     };
+    requests.merge(clientRequests(0));
     for (const auto& [kind, request] : requests) {
         std::set<std::string> expected;
         for (const auto& [entry, kinds] : table)
             if (std::string_view(kinds).contains(kind)) expected.insert(entry);
         EXPECT_EQ(contents(request), expected) << "request kind " << kind;
     }
+    for (const auto& [kind, masked] : clientRequests(kFieldMaskNoLocation)) {
+        std::set<std::string> expected = contents(requests.at(kind));
+        if (std::string_view("szm").contains(kind))
+            std::erase_if(expected, [](const std::string& entry) {
+                return entry.starts_with("latlng") || entry.starts_with("geosrc") || entry.contains("Whitelisted-App");
+            });
+        EXPECT_EQ(contents(masked), expected) << "request kind " << kind;
+    }
     EXPECT_EQ(requests.at('u').method, "POST");
     EXPECT_EQ(requests.at('u').timeout, std::chrono::seconds(300));
     EXPECT_EQ(requests.at('b').cachePolicy, UrlRequest::CachePolicy::ReloadIgnoringCache);
     EXPECT_EQ(requests.at('w').cachePolicy, UrlRequest::CachePolicy::ReloadIgnoringCache);
-}
-
-// The letters are those of the table above: which kinds still tell the place, and which the applications.
-TEST_F(RequestFactoryTest, TheFieldMaskHidesPlaceAndApplicationsOfThreeKinds)
-{
-    knowEverything();
-    const TAVSearchRequest search;
-    const TAVZeroKeywordRequest zeroKeyword;
-    TAVMoreResultsRequest more;
-    TAVCardRequest card;
-    more.moreResultsURL = card.cardURL = Url::parse("https://m.example/x");
-    const TAVLookupRequest lookup;
-    const TAVFlightSearchRequest flight;
-    const auto masked = [&](const TAVRequest& request) {
-        ClientRequest client = of(request);
-        client.fieldMask = kFieldMaskNoLocation;
-        return client;
-    };
-    const std::pair<char, UrlRequest> requests[]{
-        {'s', *factory->searchRequest(masked(search))},    {'z', *factory->zeroKeywordRequest(masked(zeroKeyword))},
-        {'m', *factory->moreResultsRequest(masked(more))}, {'l', *factory->lookupRequest(masked(lookup))},
-        {'c', *factory->cardRequest(masked(card))},        {'f', *factory->flightRequest(masked(flight))},
-    };
-    std::string place, applications;
-    for (const auto& [kind, request] : requests) {
-        EXPECT_EQ(request.url.queryValue("latlng").has_value(), request.url.queryValue("geosrc").has_value()) << kind;
-        if (request.url.queryValue("latlng")) place += kind;
-        if (request.headers.find("X-Quorvane-Whitelisted-App-Signature")) applications += kind;
-    }
-    EXPECT_EQ(place, "lcf");
-    EXPECT_EQ(applications, "lcf");
 }
 
 TEST_F(RequestFactoryTest, TheEndpointsOwnItemsAndTheQuerysItemsWin)
@@ -228,17 +214,6 @@ TEST_F(RequestFactoryTest, TheEndpointsOwnItemsAndTheQuerysItemsWin)
     EXPECT_EQ(factory->searchRequest(client)->timeout, std::chrono::seconds(7));
     client.timeout = std::chrono::seconds(2);
     EXPECT_EQ(factory->searchRequest(client)->timeout, std::chrono::seconds(2));
-}
-
-TEST_F(RequestFactoryTest, WithoutUrlThereIsNoRequest)
-{
-    bag = bagOf("{}");
-    EXPECT_FALSE(factory->searchRequest(of(TAVSearchRequest())));
-    EXPECT_FALSE(factory->zeroKeywordRequest(of(TAVZeroKeywordRequest())));
-    EXPECT_FALSE(factory->lookupRequest(of(TAVLookupRequest())));
-    EXPECT_FALSE(factory->flightRequest(of(TAVFlightSearchRequest())));
-    EXPECT_FALSE(factory->cardRequest(of(TAVCardRequest())));
-    EXPECT_FALSE(factory->moreResultsRequest(of(TAVMoreResultsRequest())));
 }
 
 TEST_F(RequestFactoryTest, TheTriggerSaysWhetherTheQueryIsASuggestion)
@@ -300,34 +275,88 @@ TEST_F(RequestFactoryTest, WhatTheDeviceDoesNotHaveIsLeftOut)
 
 TEST_F(RequestFactoryTest, OnlyAllowedSourcesTellThePlace)
 {
-    device.location.moveTo(platform::Location{47.375, 8.545, "wifi"});
-    device.drain();
-    EXPECT_TRUE(factory->context().geoLocationLatLng.empty()) << "no bag has allowed a source";
+    const auto place = [&] { return factory->context().geoLocationLatLng + factory->context().geoLocationSource; };
+    move(kZurich);
+    EXPECT_EQ(place(), "") << "no bag has allowed a source";
     knowEverything();
     EXPECT_EQ(device.location.allowed, std::set<std::string>{"wifi"});
-    device.location.moveTo(platform::Location{1, 2, "gps"});
-    device.drain();
-    EXPECT_TRUE(factory->context().geoLocationLatLng.empty());
+    move(platform::Location{1, 2, "gps"});
+    EXPECT_EQ(place(), "");
+    move(kZurich);
+    EXPECT_EQ(place(), "47.375000,8.545000wifi");
+    announce(platform::Dictionary{{"supportedGeoLocationSources", platform::Value::Array{"gps", "cell"}}});
+    EXPECT_EQ(device.location.allowed, (std::set<std::string>{"cell", "gps"}));
+    EXPECT_EQ(place(), "") << "the bag has withdrawn the source";
+    move(kZurich);
+    EXPECT_EQ(place(), "") << "reported late";
+}
 
+TEST_F(RequestFactoryTest, DownloadsTellThePlaceOfTheLastSearchUntilItIsLost)
+{
+    announce(bag.rawBag());
+    const auto place = [&](bool included) {
+        const auto request = factory->fileDownloadRequest(*Url::parse("https://r.example/"), "", included);
+        const std::string* header = request.headers.find("X-Quorvane-FuzzedLatLong");
+        return header ? *header : "";
+    };
+    const std::tuple<const char*, std::function<void()>, const char*> steps[]{
+        {"searched nowhere", [&] { performSearch(); }, ""},
+        {"came, but hasn't searched", [&] { move(kZurich); }, ""},
+        {"searched", [&] { performSearch(); }, "47.375000,8.545000"},
+        {"moved on", [&] { move(platform::Location{46.205, 6.145, "wifi"}); }, "47.375000,8.545000"},
+        {"searched there", [&] { performSearch(); }, "46.205000,6.145000"},
+        {"lost", [&] { move(std::nullopt); }, ""},
+        {"found", [&] { move(kZurich); }, ""},
+        {"searched again", [&] { performSearch(); }, "47.375000,8.545000"},
+        {"withdrawn by the bag", [&] { announce(platform::Dictionary()); }, ""},
+    };
+    for (const auto& [name, happens, told] : steps) {
+        happens();
+        EXPECT_EQ(place(true), told) << name;
+        EXPECT_EQ(place(false), "") << name;
+    }
+}
+
+TEST_F(RequestFactoryTest, MostKindsAskWhereTheDeviceIs)
+{
     TAVMoreResultsRequest more, placed;
     more.moreResultsURL = Url::parse("https://m.example/x");
     placed.moreResultsURL = Url::parse("https://m.example/x?latlng=1,2"); // says where the search was made
     TAVCardRequest card;
     card.cardURL = more.moreResultsURL;
-    const auto updates = [&](const auto& ask) {
+    const auto asks = [&](auto recipe, const TAVRequest& request) {
         const int before = device.location.updatesRequested;
-        (void)ask();
-        return device.location.updatesRequested - before;
+        EXPECT_TRUE((factory.get()->*recipe)(of(request)));
+        return device.location.updatesRequested > before;
     };
-    EXPECT_EQ(updates([&] { return factory->searchRequest(of(TAVSearchRequest())); }), 1);
-    EXPECT_EQ(updates([&] { return factory->zeroKeywordRequest(of(TAVZeroKeywordRequest())); }), 1);
-    EXPECT_EQ(updates([&] { return factory->lookupRequest(of(TAVLookupRequest())); }), 1);
-    EXPECT_EQ(updates([&] { return factory->flightRequest(of(TAVFlightSearchRequest())); }), 1);
-    EXPECT_EQ(updates([&] { return factory->moreResultsRequest(of(more)); }), 1);
-    EXPECT_EQ(updates([&] { return factory->moreResultsRequest(of(placed)); }), 0);
-    EXPECT_EQ(updates([&] { return factory->cardRequest(of(card)); }), 0);
-    const auto withoutBag = factory->moreResultsRequest({.request = more, .userAgent = "agent/1"});
-    EXPECT_EQ(*withoutBag->headers.find("User-Agent"), "agent/1");
+    using Factory = TAVNetworkRequestFactory;
+    EXPECT_TRUE(asks(&Factory::searchRequest, TAVSearchRequest()));
+    EXPECT_TRUE(asks(&Factory::zeroKeywordRequest, TAVZeroKeywordRequest()));
+    EXPECT_TRUE(asks(&Factory::lookupRequest, TAVLookupRequest()));
+    EXPECT_TRUE(asks(&Factory::flightRequest, TAVFlightSearchRequest()));
+    EXPECT_TRUE(asks(&Factory::moreResultsRequest, more));
+    EXPECT_FALSE(asks(&Factory::moreResultsRequest, placed));
+    EXPECT_FALSE(asks(&Factory::cardRequest, card));
+}
+
+TEST_F(RequestFactoryTest, LanguagesThatCannotBeEncodedAreLeftOut)
+{
+    for (const auto& [language, header] : {std::pair("de-CH", R"(["de-CH","en"])"), {"d\xc3\xa9", ""}, {"d e", ""}}) {
+        const platform::test::LogCapture lines;
+        device.locale.context.preferredLanguages = {language, "en"};
+        device.locale.handler(platform::LocaleSource::Change::Locale);
+        device.drain();
+        EXPECT_EQ(factory->context().preferredLanguages, header) << language;
+        EXPECT_EQ(lines.count("Error encoding preferred languages"), *header ? 0 : 1) << language;
+    }
+}
+
+TEST_F(RequestFactoryTest, ANewGuidIsTaken)
+{
+    assembly.guidController = std::make_shared<TavrinUserGUIDController>(assembly);
+    assembly.guidController->reset();
+    device.drain();
+    EXPECT_EQ(factory->context().userGuid, assembly.guidController->currentUserGUID());
 }
 
 TEST_F(RequestFactoryTest, TheDevicesCountrySaysWhereTheBagIs)
@@ -366,7 +395,6 @@ TEST_F(RequestFactoryTest, ChangesThatConcernTheBagAreTold)
 
 TEST_F(RequestFactoryTest, MalformedDebugParametersAreLoggedAndLeftOut)
 {
-    platform::test::LogCapture log;
     device.userDefaults.set("TAVDebugParameters", "a=1&b&=c&d=&e=f=g&&h=2");
     const auto debugged = TAVNetworkRequestFactory::make(assembly);
     device.drain();

@@ -1,14 +1,8 @@
-#include <gtest/gtest.h>
-
-#include "CoreTavrin/TAVBag.h"
-#include "platform/values/Dictionary.h"
 #include "platform/values/Json.h"
-#include "tavrind/Assembly.h"
 #include "tavrind/TAVNetworkRequestFactory.h"
-#include "tavrind/TavrinBagController.h"
 #include "tavrind/TavrinSubscriptionInfo.h"
 #include "tavrind/TavrinSubscriptionManager.h"
-#include "tests/support/TestDevice.h"
+#include "tests/support/AssemblyFixture.h"
 
 namespace tavrin {
 namespace {
@@ -80,19 +74,12 @@ TEST(SubscriptionInfo, NeedsATypeAndExpiresSecondsFromNow)
     EXPECT_FALSE(TavrinSubscriptionInfo::withString("expires=10", now));
 }
 
-struct SubscriptionManagerTest : testing::Test {
+struct SubscriptionManagerTest : test::AssemblyTest {
     SubscriptionManagerTest()
     {
         device.profile.current = {.storefront = "143459"};
         factory = TAVNetworkRequestFactory::make(assembly);
         manager = TavrinSubscriptionManager::make(assembly, factory);
-        device.drain();
-    }
-    void bag(Dictionary entries)
-    {
-        device.notifications.post(
-            {.name = TAVBagChangeNotification,
-             .userInfo = {{"bag", std::make_shared<const TAVBag>(std::move(entries), "Vistrel/4")}}});
         device.drain();
     }
     std::string header() { return factory->context().subscriptionInfo; }
@@ -101,9 +88,6 @@ struct SubscriptionManagerTest : testing::Test {
     const Dictionary lists{{"subscriptionProviderDomainWhitelist", Value::Array{"d.example"}},
                            {"subscriptionProviderBundleIdentifierWhitelist", Value::Array{"a", "b"}},
                            {"subscriptionTTL", 60}};
-    platform::test::TestDevice device;
-    platform::test::LogCapture log;
-    Assembly assembly{device.device};
     std::shared_ptr<TAVNetworkRequestFactory> factory;
     std::shared_ptr<TavrinSubscriptionManager> manager;
 };
@@ -115,7 +99,7 @@ TEST_F(SubscriptionManagerTest, TheHeaderFollowsTheBagTheProvidersAndTheProfile)
     device.drain();
     EXPECT_EQ(header(), "");
 
-    bag(lists);
+    announce(lists);
     EXPECT_EQ(header(), kFuseOnly);
     EXPECT_EQ(device.subscriptions.asked.bundleIdentifiers, (std::vector<std::string>{"a", "b"}));
     EXPECT_EQ(device.subscriptions.asked.domains, std::vector<std::string>{"d.example"});
@@ -131,7 +115,7 @@ TEST_F(SubscriptionManagerTest, TheHeaderFollowsTheBagTheProvidersAndTheProfile)
     EXPECT_EQ(manager->subscriptions().size(), 2u);
     EXPECT_EQ(factory->context().storeFrontIdentifier, "143441");
 
-    bag({{"subscriptionProviderDomainWhitelist", Value::Array{"d.example"}}});
+    announce(Dictionary{{"subscriptionProviderDomainWhitelist", Value::Array{"d.example"}}});
     EXPECT_EQ(header(), "") << "a list is missing";
     EXPECT_TRUE(manager->subscriptions().empty());
 }
@@ -140,7 +124,7 @@ TEST_F(SubscriptionManagerTest, AFailureOfTheProvidersLeavesTheMakersOwn)
 {
     EXPECT_EQ(factory->context().storeFrontIdentifier, "143459");
     device.subscriptions.services = {{"daily", Value::dictionaryOf({{"provider", "daily"}})}};
-    bag(lists);
+    announce(lists);
     EXPECT_NE(header(), kFuseOnly);
     device.subscriptions.services = std::unexpected(platform::Error::posix(EIO));
     device.subscriptions.handler();
@@ -160,7 +144,7 @@ TEST_F(SubscriptionManagerTest, TheHeaderHoldsWholeSubscriptionsUpToItsLimit)
     };
     const std::size_t rest = 4096 - fuse.size() - std::string(R"(,{"provider":"a","text":""})").size();
     device.subscriptions.services = {{"a", subscription("a", rest)}};
-    bag(lists);
+    announce(lists);
     EXPECT_EQ(header().size(), 4096u);
     EXPECT_EQ(log.count("is not sent"), 0);
     device.subscriptions.services = {
