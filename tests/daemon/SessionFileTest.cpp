@@ -1,9 +1,6 @@
 #include <algorithm>
 
 #include "platform/values/Archive.h"
-#include "platform/values/Dictionary.h"
-#include "platform/values/Json.h"
-#include "platform/values/Record.h"
 #include "tavrind/ArchivedDataIterator.h"
 #include "tavrind/ClientSessionHeader.h"
 #include "tavrind/mmap_file.h"
@@ -12,8 +9,6 @@
 #include "tavrind/TavrinFeedbackFlusher.h"
 #include "tests/support/Examples.h"
 #include "tests/support/FeedbackFixture.h"
-#include "tests/support/FullDisk.h"
-#include "tests/support/TemporaryDirectory.h"
 
 namespace tavrin::test {
 namespace {
@@ -44,18 +39,32 @@ struct SessionFileTest : FeedbackTest {
         header.firstUse = true;
         return header;
     }
+    using Feedbacks = std::vector<std::shared_ptr<TavrinFeedback>>;
     /// A closed file with these events.
-    std::shared_ptr<FileContainer> closedFile(const std::vector<std::string>& inputs)
+    std::shared_ptr<FileContainer> closedFileOf(const Feedbacks& events, const ClientSessionHeader& head = header())
     {
         auto container = storage()->createFileContainerForWriting(FileUse::Session);
-        container->writeSessionHeader(header());
-        for (const std::string& input : inputs) {
+        container->writeSessionHeader(head);
+        for (const auto& event : events) {
             assembly().feedbackBooks.record(FeedbackFate::Open);
-            container->writeFeedback(feedback(input), {});
+            container->writeFeedback(event, {});
         }
         storage()->closeSessionWithFileContainer(container);
         device.drain();
         return container;
+    }
+    std::shared_ptr<FileContainer> closedFile(const std::vector<std::string>& inputs)
+    {
+        Feedbacks events;
+        for (const std::string& input : inputs) events.push_back(feedback(input));
+        return closedFileOf(events);
+    }
+    static std::string uploadOf(FileContainer& container)
+    {
+        MemoryOutputStream stream;
+        stream.open();
+        EXPECT_TRUE(container.read().session->getFeedbacksToSend(stream));
+        return stream.contents();
     }
     /// A file of an earlier process, adopted as it is.
     std::shared_ptr<FileContainer> adopted(const std::string& bytes)
@@ -153,14 +162,18 @@ TEST_F(SessionFileTest, LimitsToTheByte)
 TEST_F(SessionFileTest, ARecordThatFailedIsNotThere)
 {
     start();
-    auto container = storage()->createFileContainerForWriting(FileUse::Session);
-    container->writeSessionHeader(header());
-    int failing = 1;
-    device.files.fault = [&](std::string_view operation, const std::filesystem::path&) {
-        return operation == "append" && failing++ % 2 == 0 ? ENOSPC : 0;
+    std::set<int> failing; // of the writes from here on
+    const auto failFrom = [&](std::set<int> writes) {
+        failing = std::move(writes);
+        device.files.fault = [&, write = 0](std::string_view operation, const std::filesystem::path&) mutable {
+            return operation == "append" && failing.contains(write++) ? ENOSPC : 0;
+        };
     };
     LogCapture log;
-    device.drain(); // the version is written, the header fails
+    auto container = storage()->createFileContainerForWriting(FileUse::Session);
+    failFrom({1}); // the version is written, the header fails
+    container->writeSessionHeader(header());
+    device.drain();
     EXPECT_EQ(log.count("Could not write version string"), 0);
     EXPECT_EQ(log.count("Could not write root object"), 1);
     bool abandoned = false;
@@ -170,64 +183,16 @@ TEST_F(SessionFileTest, ARecordThatFailedIsNotThere)
     EXPECT_TRUE(abandoned);
 
     container = storage()->createFileContainerForWriting(FileUse::Session);
-    failing = 2; // the version fails
+    failFrom({0});
     container->writeSessionHeader(header());
     device.drain();
     EXPECT_EQ(log.count("Could not write version string"), 1);
     EXPECT_EQ(log.count("Could not write root object"), 2) << "the file is closed";
     EXPECT_EQ(contents(container->fileUrl().filename()), "");
 
-    container = storage()->createFileContainerForWriting(FileUse::Session);
-    failing = -1; // odd: the version and the header go
-    device.files.fault = {};
-    container->writeSessionHeader(header());
-    device.drain();
-    failing = 1;
-    device.files.fault = [&](std::string_view operation, const std::filesystem::path&) {
-        return operation == "append" && failing++ % 2 == 0 ? EIO : 0;
-    };
-    for (const char* input : {"1", "2", "3", "4", "5"}) container->writeFeedback(feedback(input), {});
-    storage()->closeSessionWithFileContainer(container);
-    device.drain();
-    EXPECT_EQ(inputsIn(*container->read().session), (std::vector<std::string>{"1", "3", "5"}));
-}
-
-TEST_F(SessionFileTest, AWriteCutShortAtAnyByteLosesOneRecord)
-{
-    start();
-    LogCapture log; // standard error may be a file, which must not grow either
-    const platform::test::TemporaryDirectory directory;
-    const auto files = platform::makeSystemFiles();
-    const FileContainerStore& usual = storage()->store();
-    const FileContainerStore store{*files,      usual.transactions, usual.diagnosticData,
-                                   usual.queue, usual.version,      usual.maxFileSize};
-    const auto share = std::shared_ptr<const FileContainerStore>(std::shared_ptr<void>(), &store);
-    const std::vector<std::string> inputs{"a", std::string(30, 'b'), "c"};
-    const auto ends = recordEnds(contents(closedFile(inputs)->fileUrl().filename()));
-    ASSERT_EQ(ends.size(), 5u);
-    const std::size_t begin = ends[1], small = ends[2] - begin;
-    for (std::size_t room = begin; room <= ends.back(); ++room) {
-        const auto path = directory / ("session." + std::to_string(room));
-        const auto container =
-            std::make_shared<FileContainer>(share, path, std::move(*files->createForAppending(path)));
-        const auto write = [&](const std::string& input) {
-            container->writeFeedback(feedback(input), {});
-            device.drain();
-        };
-        container->writeSessionHeader(header());
-        device.drain();
-        platform::test::onFullDisk(room, [&] { std::ranges::for_each(inputs, write); });
-        write("later");
-        container->close();
-        device.drain();
-
-        std::vector<std::string> expected; // the last one still fits where the long one doesn't
-        if (room >= ends[2]) expected.push_back(inputs[0]);
-        if (room >= ends[3]) expected.push_back(inputs[1]);
-        if (room >= begin + (room >= ends[3] ? ends[3] - begin : small) + small) expected.push_back(inputs[2]);
-        expected.emplace_back("later");
-        ASSERT_EQ(inputsIn(*container->read().session), expected) << room;
-    }
+    failFrom({3, 5});
+    EXPECT_EQ(inputsIn(*closedFile({"1", "2", "3", "4", "5"})->read().session),
+              (std::vector<std::string>{"1", "3", "5"}));
 }
 
 TEST_F(SessionFileTest, WhatIsNoSessionFileIsNotRead)
@@ -242,70 +207,49 @@ TEST_F(SessionFileTest, WhatIsNoSessionFileIsNotRead)
         return bytes;
     };
     const std::string version = platform::archiveValue(ClientSessionManager::tavrindUserAgent());
-    struct Case {
-        std::string bytes;
-        const char* says;
-    };
-    for (const Case& each : {
-             Case{"", "empty file"},
-             {std::string(8, '\0'), "out of range"},
-             {std::string(9, '\0'), "empty data file"},
-             {std::string(8, '\xff') + "x", "broken version string in file"},
-             {framed({platform::archiveValue(7)}), "version string not stored"},
-             {framed({platform::archiveValue("tavrind/0.0.1")}), "version not supported: tavrind/0.0.1"},
-             {framed({version}), "client session not stored"},
-             {framed({version, platform::archive(*feedback("x"))}), "client session not stored"},
-         }) {
+    const std::string head = platform::archive(header()), event = platform::archive(*feedback("x"));
+    for (const auto& [bytes, says] :
+         {std::pair(std::string(), "empty file"),
+          {std::string(8, '\0'), "out of range"},
+          {std::string(9, '\0'), "empty data file"},
+          {std::string(8, '\xff') + "x", "broken version string in file"},
+          {framed({platform::archiveValue(7)}), "version string not stored"},
+          {framed({platform::archiveValue("tavrind/0.0.1")}), "version not supported: tavrind/0.0.1"},
+          {framed({version}), "client session not stored"},
+          {framed({version, event}), "client session not stored"}}) {
         LogCapture log;
-        EXPECT_FALSE(adopted(each.bytes)->read().session);
-        EXPECT_EQ(log.count(each.says), 1) << each.says;
+        EXPECT_FALSE(adopted(bytes)->read().session);
+        EXPECT_EQ(log.count(says), 1) << says;
     }
-    // With a bare length behind the last event, the end is told, and nothing is lost.
-    LogCapture log;
-    EXPECT_TRUE(adopted(framed({version, platform::archive(header()), platform::archive(*feedback("x"))}) +
-                        std::string(8, '\0'))
-                    ->read()
-                    .session);
-    EXPECT_EQ(log.count("out of range"), 1);
-    EXPECT_EQ(log.count("tavrin feedback expected"), 1);
-    EXPECT_EQ(log.count("could not unarchive feedback range"), 1);
-    // What can be read and is no event ends the file, too, as does what can't be read.
-    for (const auto& [next, unreadable] : {std::pair(platform::archive(header()), 0), {std::string("\xc1"), 1}}) {
-        LogCapture lines;
-        const auto [session, lost, fate] =
-            adopted(framed({version, platform::archive(header()), platform::archive(*feedback("x")), next,
-                            platform::archive(*feedback("y"))}))
-                ->read();
+    // What is no event ends the file: a bare length, what can't be read, another record.
+    const struct {
+        std::string bytes;
+        std::uint64_t lost;
+        int unreadable;
+    } ends[]{{framed({version, head, event}) + std::string(8, '\0'), 0, 1},
+             {framed({version, head, event, "\xc1", event}), 2, 1},
+             {framed({version, head, event, head, event}), 2, 0}};
+    for (const auto& end : ends) {
+        LogCapture log;
+        const auto [session, lost, fate] = adopted(end.bytes)->read();
         EXPECT_EQ(inputsIn(*session), std::vector<std::string>{"x"});
-        EXPECT_EQ(lost, 2u);
+        EXPECT_EQ(lost, end.lost);
         EXPECT_EQ(fate, FeedbackFate::DamagedTail);
-        EXPECT_EQ(lines.count("tavrin feedback expected"), 1);
-        EXPECT_EQ(lines.count("could not unarchive feedback range"), unreadable);
+        EXPECT_EQ(log.count("tavrin feedback expected"), 1);
+        EXPECT_EQ(log.count("could not unarchive feedback range"), end.unreadable);
     }
 }
 
-/// Notes the open transactions while it is encoded.
-struct Watcher : platform::RecordOf<Watcher, ZRFeedback> {
-    static constexpr std::string_view kClass = "Watcher";
-    const platform::Transactions* transactions = nullptr;
-    mutable std::map<std::string, int> seen;
-    static constexpr auto fields() { return std::tuple<>{}; }
-    void encodeFields(platform::Encoder& encoder) const override
-    {
-        seen = transactions->open();
-        RecordOf::encodeFields(encoder);
-    }
-};
-
-TEST_F(SessionFileTest, TheProcessIsWantedWhileItEncodes)
+TEST_F(SessionFileTest, TheProcessIsWantedWhileItWrites)
 {
     start();
-    const auto watcher = std::make_shared<Watcher>();
-    watcher->transactions = &device.transactions;
-    const auto container = storage()->createFileContainerForWriting(FileUse::Session);
-    container->writeFeedback(std::make_shared<TavrinFeedback>(watcher, 1, kGuid, "A/1"), {});
-    device.drain();
-    EXPECT_TRUE(watcher->seen.contains("archiveObject"));
+    std::map<std::string, int> meanwhile;
+    device.files.fault = [&](std::string_view operation, const auto&) {
+        if (operation == "append") meanwhile = device.transactions.open();
+        return 0;
+    };
+    closedFile({"x"});
+    EXPECT_TRUE(meanwhile.contains("archiveObject"));
     EXPECT_FALSE(device.transactions.open().contains("archiveObject"));
 }
 
@@ -315,24 +259,13 @@ TEST_F(SessionFileTest, EveryReadGivesTheSameUpload)
     const auto chosen = std::make_shared<ZRSuggestionEngagementFeedback>();
     chosen->suggestion = std::make_shared<ZRSearchSuggestion>();
     chosen->suggestion->identifier = "private";
-    const auto uploadOf = [](FileContainer& container) {
-        MemoryOutputStream stream;
-        stream.open();
-        EXPECT_TRUE(container.read().session->getFeedbacksToSend(stream));
-        return stream.contents();
-    };
-    ClientSessionHeader some = header();
     ClientSessionHeader none = header();
     none.resourceVersions = nullptr;
     for (const auto& [head, rest] :
-         {std::pair(some, R"(,"resource_versions":{"TAVCorrectionDict":"3"},"first_use":true,"base_time":1767225600,)"
-                          R"("previous_session_end_reason":"no previous session"})"),
+         {std::pair(header(), R"(,"resource_versions":{"TAVCorrectionDict":"3"},"first_use":true,)"
+                              R"("base_time":1767225600,"previous_session_end_reason":"no previous session"})"),
           {none, "}"}}) { // what is missing ends the list
-        const auto container = storage()->createFileContainerForWriting(FileUse::Session);
-        container->writeSessionHeader(head);
-        container->writeFeedback(std::make_shared<TavrinFeedback>(chosen, 1, kGuid, "Vistrel/4"), {});
-        storage()->closeSessionWithFileContainer(container);
-        device.drain();
+        const auto container = closedFileOf({std::make_shared<TavrinFeedback>(chosen, 1, kGuid, "Vistrel/4")}, head);
         for (int i = 0; i < 2; ++i)
             EXPECT_EQ(
                 uploadOf(*container),
@@ -347,21 +280,15 @@ TEST_F(SessionFileTest, EveryReadGivesTheSameUpload)
 TEST_F(SessionFileTest, UploadsAreInOrderOfTime)
 {
     start();
-    const auto container = storage()->createFileContainerForWriting(FileUse::Session);
-    container->writeSessionHeader(header());
+    Feedbacks engagements;
     for (const std::uint64_t milliseconds : {70u, 50u, 1050u, 60u}) {
         const auto engagement = std::make_shared<ZRResultEngagementFeedback>();
         engagement->timestamp = milliseconds * 1'000'000 + 999'999;
         engagement->result = std::make_shared<ZRSearchResult>();
         engagement->result->identifier = std::to_string(milliseconds);
-        container->writeFeedback(std::make_shared<TavrinFeedback>(engagement, 1, kGuid, "Vistrel/4"), {});
+        engagements.push_back(std::make_shared<TavrinFeedback>(engagement, 1, kGuid, "Vistrel/4"));
     }
-    storage()->closeSessionWithFileContainer(container);
-    device.drain();
-    MemoryOutputStream stream;
-    stream.open();
-    ASSERT_TRUE(container->read().session->getFeedbacksToSend(stream));
-    const Value events = platform::parseJson(stream.contents()).value()["fb"];
+    const Value events = platform::parseJson(uploadOf(*closedFileOf(engagements))).value()["fb"];
     std::vector<std::int64_t> times;
     for (std::size_t i = 0; i < events.count(); ++i) times.push_back(*events[i]["timestamp"].asInt());
     EXPECT_EQ(times, (std::vector<std::int64_t>{0, 10, 20, 1000, 1000})) << "since the first; what is missing last";

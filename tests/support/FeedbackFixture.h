@@ -8,6 +8,7 @@
 #include "tavrind/BackgroundActivitiesManager.h"
 #include "tavrind/FeedbackBooks.h"
 #include "tavrind/FileContainer.h"
+#include "tavrind/TavrinBagController.h"
 #include "tavrind/TavrinPersistentStorage.h"
 #include "tests/support/DaemonFixture.h"
 #include "tools/shared/Inflate.h"
@@ -31,6 +32,9 @@ struct FeedbackTest : DaemonTest {
         connection = client();
         upload(); // what the daemon says of its bag
         _uploadsBefore = allUploads().size();
+        for (const auto& task : std::vector(allUploads()))
+            if (!task->finished) task->respond(200);
+        device.drain();
     }
     /// The daemon is killed and started again.
     void restart()
@@ -53,6 +57,12 @@ struct FeedbackTest : DaemonTest {
     {
         manager()->flushSession({});
         device.drain();
+    }
+    void fetchBag(std::string body)
+    {
+        assembly().bagController->forceFetchBag(Value::dictionaryOf({{"bag", 1000}}));
+        device.drain();
+        respond(std::move(body));
     }
     /// One pass of the background activity.
     void upload()
