@@ -2,9 +2,6 @@
 #include <set>
 
 #include "platform/values/Archive.h"
-#include "platform/values/Dictionary.h"
-#include "searchrecords/ZRRecords.h"
-#include "searchrecords/ZRResultFeedback.h"
 #include "tavrind/ArchivedDataIterator.h"
 #include "tavrind/ClientConnection.h"
 #include "tavrind/ClientState.h"
@@ -28,8 +25,17 @@ struct ConnectionTest : DaemonTest {
     void report(FakeConnection& connection, std::string className, Dictionary fields = {})
     {
         fields.set("class", std::move(className));
-        connection.call("ReportEvent", {"event", 3, std::move(fields)});
+        (void)call(connection, "ReportEvent", {"event", 3, std::move(fields)});
+    }
+    std::shared_ptr<FakeCall> call(FakeConnection& connection, const char* member, std::vector<Value> args = {})
+    {
+        auto made = connection.call(member, std::move(args));
         device.drain();
+        return made;
+    }
+    static Dictionary configuration(const char* identifier, const char* agent)
+    {
+        return {{"class", "TAVSessionConfiguration"}, {"identifier", identifier}, {"userAgent", agent}};
     }
 };
 
@@ -57,22 +63,15 @@ TEST_F(ConnectionTest, ConfigureAnswersTheEndpointThenPushesTheBag)
 
 TEST_F(ConnectionTest, AnInvalidConfigurationClosesTheConnection)
 {
-    const Dictionary named{{"class", "TAVSessionConfiguration"}};
-    const struct {
-        Dictionary configuration;
-        const char* text;
-    } cases[] = {
-        {{}, "configuration must not be nil"},
-        {named, "configuration requires identifier and agent"},
-        {{{"class", "TAVSessionConfiguration"}, {"identifier", "id"}}, "configuration requires identifier and agent"},
-        {{{"class", "TAVSessionConfiguration"}, {"identifier", ""}, {"userAgent", "A/1"}},
-         "client session identifier cannot be nil or empty"}};
-    for (const auto& [configuration, text] : cases) {
+    const std::string incomplete = "configuration requires identifier and agent";
+    for (const auto& [invalid, text] : std::vector<std::pair<Dictionary, std::string>>{
+             {{}, "configuration must not be nil"},
+             {Dictionary{{"class", "TAVSessionConfiguration"}}, incomplete},
+             {Dictionary{{"class", "TAVSessionConfiguration"}, {"identifier", "id"}}, incomplete},
+             {configuration("", "A/1"), "client session identifier cannot be nil or empty"}}) {
         platform::test::LogCapture log;
         auto connection = connect();
-        auto call = connection->call("Configure", {configuration});
-        device.drain();
-        EXPECT_TRUE(call->abandoned());
+        EXPECT_TRUE(call(*connection, "Configure", {invalid})->abandoned());
         EXPECT_TRUE(connection->invalidated());
         EXPECT_TRUE(log.has(platform::LogLevel::Fault, "Tavrin_Session", text));
         EXPECT_TRUE(log.has(platform::LogLevel::Fault, "Tavrin_Session", "invalid configuration, closing connection"));
@@ -105,15 +104,12 @@ TEST_F(ConnectionTest, AnUnconfiguredConnectionIsServedWhatNeedsNoClient)
 {
     auto connection = connect();
     EXPECT_EQ(reasonOf(*search(*connection, 1, "weat")), "client state nil");
-    auto sessions = connection->call("ListSessions");
-    auto resource = connection->call("FileHandleAndAttributesForResource", {"TAVQIFeatures"});
-    auto flusher = connection->call("ListenToFlusher");
-    auto status = connection->call("Status");
-    auto feedback = connection->call("Feedback", {""});
-    device.drain();
-    EXPECT_TRUE(sessions->answered() && flusher->answered() && feedback->answered());
-    EXPECT_EQ(resource->argument(2)["code"], Value(404));
-    EXPECT_EQ(status->argument(0)["bag"]["version"], Value("9"));
+    for (const char* member : {"ListSessions", "ListenToFlusher"})
+        EXPECT_TRUE(call(*connection, member)->answered()) << member;
+    EXPECT_TRUE(call(*connection, "Feedback", {""})->answered());
+    EXPECT_EQ(call(*connection, "FileHandleAndAttributesForResource", {"TAVQIFeatures"})->argument(2)["code"],
+              Value(404));
+    EXPECT_EQ(call(*connection, "Status")->argument(0)["bag"]["version"], Value("9"));
     report(*connection, "ZRClearInputFeedback");
     connection->end();
     device.drain();
@@ -122,47 +118,35 @@ TEST_F(ConnectionTest, AnUnconfiguredConnectionIsServedWhatNeedsNoClient)
 
 TEST_F(ConnectionTest, ACallerWithOneCallIntroducesItselfInsideItsRequest)
 {
-    const auto ask = [&](Value configuration) {
-        auto connection = connect();
-        auto call = connection->call("Request", {Value::dictionaryOf({{"class", "TAVSearchRequest"},
-                                                                      {"queryString", "weat"},
-                                                                      {"queryId", 1},
-                                                                      {"configuration", std::move(configuration)}})});
-        device.drain();
-        return std::pair(connection, call);
+    const auto ask = [&](FakeConnection& connection, Dictionary introduction) {
+        return call(connection, "Request",
+                    {Dictionary{{"class", "TAVSearchRequest"},
+                                {"queryString", "weat"},
+                                {"queryId", 1},
+                                {"configuration", std::move(introduction)}}});
     };
-    const auto [connection, call] = ask(Value::dictionaryOf(
-        {{"class", "TAVSessionConfiguration"}, {"identifier", "com.quorvane.vistrel"}, {"userAgent", "Vistrel/4"}}));
-    lastTask()->respond(200, "[]");
-    device.drain();
-    EXPECT_EQ(call->argument(1)["class"], Value("TAVReply"));
+    auto answered = ask(*connect(), configuration("com.quorvane.vistrel", "Vistrel/4"));
+    respond("[]");
+    EXPECT_EQ(answered->argument(1)["class"], Value("TAVReply"));
 
-    const auto [refused, unanswered] = ask(Value::dictionaryOf({{"class", "TAVSessionConfiguration"}}));
+    const auto refused = connect();
+    (void)ask(*refused, {{"class", "TAVSessionConfiguration"}});
     EXPECT_TRUE(refused->invalidated());
 }
 
-TEST_F(ConnectionTest, CallsWithoutARecordAreNotAnswered)
+TEST_F(ConnectionTest, CallsWithoutARecordAreNotAnsweredAndMalformedOnesAreRefused)
 {
     for (auto connection : {connect(), client()}) {
-        auto request = connection->call("Request", {Dictionary()});
-        auto plain = connection->call("Request", {Dictionary{{"class", "TAVRequest"}}});
-        auto event = connection->call("ReportEvent", {"event", 1, Dictionary()});
-        device.drain();
-        EXPECT_TRUE(request->abandoned() && plain->abandoned() && event->answered());
+        EXPECT_TRUE(call(*connection, "Request", {Dictionary()})->abandoned());
+        EXPECT_TRUE(call(*connection, "Request", {Dictionary{{"class", "TAVRequest"}}})->abandoned());
+        EXPECT_TRUE(call(*connection, "ReportEvent", {"event", 1, Dictionary()})->answered());
+        const auto refused =
+            call(*connection, "Request", {Dictionary{{"class", "TAVSearchRequest"}, {"queryId", "one"}}})->take();
+        ASSERT_FALSE(refused);
+        EXPECT_TRUE(refused.error().message.contains("request") && refused.error().message.contains("queryId"))
+            << refused.error().message;
         EXPECT_FALSE(connection->invalidated());
     }
-}
-
-TEST_F(ConnectionTest, MalformedCallsAreRefusedAndTheConnectionLivesOn)
-{
-    auto connection = client();
-    auto call = connection->call("Request", {Value::dictionaryOf({{"class", "TAVSearchRequest"}, {"queryId", "one"}})});
-    device.drain();
-    const auto refused = call->take();
-    ASSERT_FALSE(refused);
-    EXPECT_TRUE(refused.error().message.contains("request") && refused.error().message.contains("queryId"))
-        << refused.error().message;
-    EXPECT_TRUE(search(*connection, 1, "weat")->pending());
 }
 
 TEST_F(ConnectionTest, MissingDefaultsAreCompletedFromTheDevice)
@@ -177,16 +161,6 @@ TEST_F(ConnectionTest, MissingDefaultsAreCompletedFromTheDevice)
     device.locale.inputMode = "fr";
     (void)search(*connection, 2, "weat", {{"keyboardInputMode", ""}});
     EXPECT_EQ(lastTask()->originalRequest().url.queryValue("kb_ime"), "fr");
-}
-
-TEST_F(ConnectionTest, ConnectionsOfOneClientShareItsState)
-{
-    auto& manager = *assembly().clientStateManager;
-    EXPECT_EQ(manager.stateForClientIdentifier("a"), manager.stateForClientIdentifier("a"));
-    EXPECT_NE(manager.stateForClientIdentifier("a"), manager.stateForClientIdentifier("b"));
-    EXPECT_FALSE(manager.stateForClientIdentifier(""));
-    EXPECT_FALSE(manager.stateForClientIdentifier(std::nullopt));
-    EXPECT_TRUE(manager.sessions().empty()) << "none has a user agent yet";
 }
 
 TEST_F(ConnectionTest, TheRegistryPersistsOnlyWhenAskedTo)
@@ -212,37 +186,37 @@ TEST_F(ConnectionTest, TheEndpointServesMoreResultsAndCardsAlone)
 {
     auto main = client();
     auto endpoint = device.ipc.connect(assembly().clientStateManager->endpoint());
-    const auto ask = [&](const char* className, const char* identifier) {
-        auto call = endpoint->call(
-            "Request", {Value::dictionaryOf({{"class", className},
-                                             {"queryId", 4},
-                                             {"moreResultsURL", "https://m.example/x"},
-                                             {"cardURL", "https://m.example/x"}}),
-                        Value::dictionaryOf({{"class", "TAVSessionConfiguration"}, {"identifier", identifier}})});
-        device.drain();
-        return call;
+    const auto ask = [&](const char* className, const char* identifier = "com.quorvane.vistrel") {
+        return call(*endpoint, "Request",
+                    {Dictionary{{"class", className},
+                                {"queryId", 4},
+                                {"moreResultsURL", "https://m.example/x"},
+                                {"cardURL", "https://m.example/x"}},
+                     Dictionary{{"class", "TAVSessionConfiguration"}, {"identifier", identifier}}});
     };
-    auto more = ask("TAVMoreResultsRequest", "com.quorvane.vistrel");
+    auto more = ask("TAVMoreResultsRequest");
     respond("[]");
     EXPECT_GT(more->argument(1).count(), 0u);
-    EXPECT_TRUE(ask("TAVCardRequest", "com.quorvane.vistrel")->pending());
-    EXPECT_TRUE(ask("TAVZeroKeywordRequest", "com.quorvane.vistrel")->abandoned());
-    EXPECT_TRUE(ask("TAVSearchRequest", "com.quorvane.vistrel")->abandoned());
+    EXPECT_TRUE(ask("TAVCardRequest")->pending());
+    for (const char* other :
+         {"TAVZeroKeywordRequest", "TAVSearchRequest", "TAVLookupRequest", "TAVFlightSearchRequest"})
+        EXPECT_TRUE(ask(other)->abandoned()) << other;
     auto nobody = ask("TAVMoreResultsRequest", "");
     EXPECT_EQ(nobody->argument(0), Value(4));
     EXPECT_TRUE(reasonOf(*nobody).starts_with("invalid configuration "));
-    auto images = endpoint->call("LoadImages", {Value::Array{}, 0u});
-    device.drain();
-    EXPECT_TRUE(images->answered());
+    EXPECT_TRUE(call(*endpoint, "LoadImages", {Value::Array{}, 0u})->answered());
 }
 
-TEST_F(ConnectionTest, NoClientMakesTheDaemonKnowIdentifiersWithoutEnd)
+TEST_F(ConnectionTest, EveryIdentifierHasAStateButNotWithoutEnd)
 {
-    ASSERT_FALSE(client("com.example.early")->invalidated());
-    for (int i = 0; i < 1024; ++i)
-        (void)assembly().clientStateManager->stateForClientIdentifier("com.example." + std::to_string(i));
+    auto& manager = *assembly().clientStateManager;
+    EXPECT_FALSE(manager.stateForClientIdentifier("") || manager.stateForClientIdentifier(std::nullopt));
+    EXPECT_NE(manager.stateForClientIdentifier("a"), manager.stateForClientIdentifier("b"));
+    EXPECT_TRUE(manager.sessions().empty()) << "none has a user agent yet";
+    const auto early = manager.stateForClientIdentifier("early");
+    for (int i = 0; i < 1024; ++i) (void)manager.stateForClientIdentifier("com.example." + std::to_string(i));
     EXPECT_TRUE(client("com.example.late")->invalidated());
-    EXPECT_FALSE(client("com.example.early")->invalidated());
+    EXPECT_EQ(manager.stateForClientIdentifier("early"), early);
 }
 
 TEST_F(ConnectionTest, CountsConnectionsAndTheirEnds)
@@ -301,14 +275,12 @@ TEST_F(ConnectionTest, EngagementsOfTopHitsAndOfTheServicesResultsAreCounted)
 {
     const auto named = client();
     const auto nameless = client("org.example.app", "Example/1", 78);
-    struct {
+    const struct {
         FakeConnection& from;
-        std::string record;
-        int topHit;
-        int type;
-        std::int64_t topHits; ///< counted so far
-        std::int64_t ofService;
-    } const cases[] = {
+        const char* record;
+        int topHit, type;
+        std::int64_t topHits, ofService; ///< counted so far
+    } cases[]{
         {*named, "ZRResultEngagementFeedback", 0, 0, 0, 0},
         {*named, "ZRResultEngagementFeedback", 2, 2, 1, 0},
         {*named, "ZRResultEngagementFeedback", 1, 9, 2, 0},
@@ -318,25 +290,26 @@ TEST_F(ConnectionTest, EngagementsOfTopHitsAndOfTheServicesResultsAreCounted)
         {*nameless, "ZRResultEngagementFeedback", 2, 1, 3, 2},
     };
     for (const auto& c : cases) {
-        report(
-            c.from, c.record,
-            {{"result", Value::dictionaryOf({{"class", "ZRSearchResult"}, {"type", c.type}, {"topHit", c.topHit}})}});
+        report(c.from, c.record,
+               {{"result", Dictionary{{"class", "ZRSearchResult"}, {"type", c.type}, {"topHit", c.topHit}}}});
+        report(c.from, c.record); // without a result
         EXPECT_EQ(counter("vistrel.tophit.engagements"), c.topHits) << c.record << c.topHit << c.type;
         EXPECT_EQ(counter("vistrel.tavrin.engagements"), c.ofService) << c.record << c.topHit << c.type;
     }
-    report(*named, "ZRResultEngagementFeedback"); // without a result
-    EXPECT_EQ(counter("vistrel.tophit.engagements"), 3);
 }
 
 TEST_F(ConnectionTest, WarmsTheConnectionWhenASearchViewAppears)
 {
+    startWithoutBag();
     auto connection = client();
-    device.advance(31s);
+    deliverBag();
     const auto warmed = [&](int event, bool lockScreen) {
         const std::size_t before = tasks().size();
         report(*connection, "ZRSearchViewAppearFeedback", {{"viewAppearEvent", event}, {"isOnLockScreen", lockScreen}});
         return tasks().size() > before;
     };
+    EXPECT_FALSE(warmed(2, false)) << "the bag has been asked for just now";
+    device.advance(31s);
     const std::set<int> warming{2, 5, 6, 9, 10, 11, 22, 23, 24};
     for (int event = -1; event <= 27; ++event) {
         EXPECT_FALSE(warmed(event, true)) << event;
@@ -390,9 +363,9 @@ TEST_F(RecordedConnectionTest, TheDaemonsOwnRequestsAreRecordedAsItsOwn)
         EXPECT_EQ(record["feedback"]["input"], Value("")) << path;
         EXPECT_EQ(record["user_agent"], Value(ClientSessionManager::tavrindUserAgent())) << path;
         EXPECT_EQ(record["query_id"].asDouble().value_or(0), 0) << path;
+        EXPECT_EQ(record["user_guid"], Value(assembly().guidController->currentUserGUID().string()))
+            << path << ": the daemon's, while the client has one of its own";
     }
-    EXPECT_EQ(records["/warm"]["user_guid"], Value(assembly().guidController->currentUserGUID().string()))
-        << "in the shared session, where the client has one of its own";
 }
 
 TEST_F(RecordedConnectionTest, EveryEventAndEverySearchNoticesAStaleBag)

@@ -100,42 +100,37 @@ TEST_F(SearchTest, SkipsWhatNeedsNoSearch)
 // What the service may answer, and what the client and the session then get.
 struct Answer {
     const char* name;
-    int status;
     std::string body;
-    bool record; // the reply has a raw response
-    bool error;
-    Classes feedback; // after the start record
+    bool read;       // the reply has a raw response, else an error
+    const char* end; // the record after the start record
+    int status = 200;
 };
 
 TEST_F(SearchTest, EveryAnswerOfTheServiceIsAnswered)
 {
     const Answer answers[]{
-        {"error status with JSON", 500, R"([{"status": "ERROR"}])", true, false, {"TAVEndNetworkSearchFeedback"}},
-        {"empty array", 200, "[]", true, false, {"ZREndNetworkSearchFeedback"}},
-        {"object", 200, R"({"status": "OK"})", true, false, {"ZREndNetworkSearchFeedback"}},
-        {"array of numbers", 200, "[1]", true, false, {"TAVEndNetworkSearchFeedback"}},
-        {"wrong types",
-         200,
-         R"([{"status": 3, "fbq": [], "duration": "x"}])",
-         true,
-         false,
-         {"TAVEndNetworkSearchFeedback"}},
-        {"no JSON", 200, "<html>", false, true, {"ZREndNetworkSearchFeedback"}},
-        {"nothing", 200, "", false, true, {"ZREndNetworkSearchFeedback"}},
-        {"deep", 200, std::string(200, '['), false, true, {"ZREndNetworkSearchFeedback"}},
-        {"invalid UTF-8", 200, "[\"\xff\"]", false, true, {"ZREndNetworkSearchFeedback"}},
+        {"error status with JSON", R"([{"status": "ERROR"}])", true, "TAVEndNetworkSearchFeedback", 500},
+        {"empty array", "[]", true, "ZREndNetworkSearchFeedback"},
+        {"object", R"({"status": "OK"})", true, "ZREndNetworkSearchFeedback"},
+        {"array of numbers", "[1]", true, "TAVEndNetworkSearchFeedback"},
+        {"wrong types", R"([{"status": 3, "fbq": [], "duration": "x"}])", true, "TAVEndNetworkSearchFeedback"},
+        {"no JSON", "<html>", false, "ZREndNetworkSearchFeedback"},
+        {"nothing", "", false, "ZREndNetworkSearchFeedback"},
+        {"deep", std::string(200, '['), false, "ZREndNetworkSearchFeedback"},
+        {"invalid UTF-8", "[\"\xff\"]", false, "ZREndNetworkSearchFeedback"},
     };
     auto connection = client();
     std::int64_t id = 0;
     for (const Answer& answer : answers) {
+        SCOPED_TRACE(answer.name);
         auto call = search(*connection, ++id, "weat");
         session->takeClasses();
         respond(answer.body, answer.status);
-        ASSERT_TRUE(call->answered()) << answer.name;
-        EXPECT_GT(call->argument(1).count(), 0u) << answer.name;
-        EXPECT_EQ(!call->argument(1)["rawResponse"].isNull(), answer.record) << answer.name;
-        EXPECT_EQ(call->argument(2).count() > 0, answer.error) << answer.name;
-        EXPECT_EQ(session->takeClasses(), answer.feedback) << answer.name;
+        ASSERT_TRUE(call->answered());
+        EXPECT_GT(call->argument(1).count(), 0u);
+        EXPECT_EQ(!call->argument(1)["rawResponse"].isNull(), answer.read);
+        EXPECT_EQ(call->argument(2).count() > 0, !answer.read);
+        EXPECT_EQ(session->takeClasses(), Classes{answer.end});
     }
 }
 
@@ -156,16 +151,6 @@ TEST_F(SearchTest, TransportErrorsReachTheClientAndTheSession)
     EXPECT_EQ(reasonOf(*call), "invalid response class");
 }
 
-TEST_F(SearchTest, ABagWithoutSearchUrlIsAnError)
-{
-    startWithoutBag();
-    deliverBag("{}");
-    auto connection = client();
-    auto call = search(*connection, 1, "weat");
-    EXPECT_EQ(reasonOf(*call), "no URL");
-    EXPECT_EQ(session->takeClasses(), Classes{"ZRErrorFeedback"});
-}
-
 TEST_F(SearchTest, MessagesKeepTheirPlaceToThemselves)
 {
     device.location.allowed = {"wifi"};
@@ -179,6 +164,21 @@ TEST_F(SearchTest, MessagesKeepTheirPlaceToThemselves)
     EXPECT_FALSE(lastTask()->originalRequest().url.queryValue("latlng"));
     (void)search(*browser, 1, "weat");
     EXPECT_TRUE(lastTask()->originalRequest().url.queryValue("latlng"));
+}
+
+TEST_F(SearchTest, RequestsNameTheGuidOfTheirClient)
+{
+    for (const bool shared : {true, false}) {
+        device.userDefaults.set("TAVSharedSession", shared);
+        startWithoutBag();
+        deliverBag();
+        std::set<std::string> guids;
+        for (const char* identifier : {"com.quorvane.vistrel", "com.quorvane.wendral"}) {
+            (void)search(*client(identifier), 1, "weat");
+            guids.insert(*lastTask()->originalRequest().headers.find("X-Quorvane-UserGuid"));
+        }
+        EXPECT_EQ(guids.size(), shared ? 1u : 2u);
+    }
 }
 
 TEST_F(SearchTest, TheServiceMayForceANewBag)
@@ -372,6 +372,7 @@ TEST_F(KindsTest, EachTakesItsRoad)
         EXPECT_EQ(tracePoints, kind.trace);
         EXPECT_GT(call->argument(1).count(), 0u);
         EXPECT_EQ(log.count(std::string("Got network response for ") + kind.name), 1);
+        EXPECT_EQ(session->records.back()->clientQueryId, 0u) << "the end names its start";
         EXPECT_EQ(session->takeClasses().back(), "TAVEndNetworkSearchFeedback");
     }
     EXPECT_EQ(counter("search"), 1);
@@ -406,17 +407,42 @@ TEST_F(KindsTest, EachFailsWithItsQuery)
     }
 }
 
-TEST_F(KindsTest, ALookupIsNotRepeatedAfterItsDeadline)
+TEST_F(KindsTest, ALookupIsNotRepeatedAfterTheClientsTimeOut)
 {
-    auto connection = client();
-    for (const platform::Duration late : {platform::Duration(60s), platform::Duration(60s + 1ns)}) {
-        auto call = ask(*connection, kKinds[4]);
-        device.advance(late);
-        lastTask()->fail(platform::Error("X", 1));
-        device.advance(0s);
-        EXPECT_EQ(call->pending(), late == 60s);
-        while (device.loader.cancelAll()) device.advance(0s); // its repetitions, too
+    for (const auto& [timeout, limit] : {std::pair(0.0, 60s), {5.0, 5s}}) {
+        auto connection = connect();
+        connection->call("Configure", {Value::dictionaryOf({{"class", "TAVSessionConfiguration"},
+                                                            {"identifier", "com.quorvane.vistrel"},
+                                                            {"userAgent", "Vistrel/4"},
+                                                            {"timeoutIntervalForRequest", timeout}})});
+        for (const platform::Duration late : {platform::Duration(limit), limit + 1ns}) {
+            auto call = ask(*connection, kKinds[4]);
+            device.advance(late);
+            lastTask()->fail(platform::Error("X", 1));
+            device.advance(0s);
+            EXPECT_EQ(call->pending(), late == limit) << timeout;
+            while (device.loader.cancelAll()) device.advance(0s); // its repetitions, too
+        }
     }
+}
+
+TEST_F(KindsTest, WithoutAUrlThereIsNoRequest)
+{
+    startWithoutBag();
+    deliverBag("{}");
+    auto connection = client();
+    const std::size_t before = tasks().size();
+    for (Kind kind : kKinds) {
+        SCOPED_TRACE(kind.className);
+        kind.fields = {{"queryString", "weat"}};
+        auto call = ask(*connection, kind);
+        EXPECT_EQ(reasonOf(*call), "no URL");
+        EXPECT_EQ(call->argument(2)["code"], Value(500));
+        ASSERT_EQ(session->records.size(), 1u);
+        EXPECT_EQ(session->records[0]->clientQueryId, 9u);
+        EXPECT_EQ(session->takeClasses(), Classes{"ZRErrorFeedback"});
+    }
+    EXPECT_EQ(tasks().size(), before);
 }
 
 TEST_F(KindsTest, ADisabledBagSkipsThem)
