@@ -4,7 +4,6 @@
 
 #include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVRequest.h"
-#include "platform/values/Dictionary.h"
 #include "platform/values/Json.h"
 #include "tavrind/TavrinBagController.h"
 #include "tests/support/DaemonFixture.h"
