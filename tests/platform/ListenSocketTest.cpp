@@ -13,15 +13,15 @@ namespace {
 
 TEST(ListenSocket, TakesOverFromTheDeadOnly)
 {
-    test::TemporaryDirectory temporary;
+    platform::test::TemporaryDirectory temporary;
     const std::filesystem::path directory = temporary.path.string() + "/a/b";
     const auto path = directory / "socket";
     const auto errorOf = [&] { return ListenSocket::bindExclusive(path).error().code; };
     {
         auto living = ListenSocket::bindExclusive(path);
         ASSERT_TRUE(living) << living.error().description();
-        EXPECT_EQ(test::modeOf(directory), 0700u);
-        EXPECT_EQ(test::modeOf(path), 0600u);
+        EXPECT_EQ(platform::test::modeOf(directory), 0700u);
+        EXPECT_EQ(platform::test::modeOf(path), 0600u);
         EXPECT_EQ(errorOf(), EADDRINUSE);
         std::filesystem::remove(directory / "socket.lock"); // as with a socket of the service manager
         EXPECT_EQ(errorOf(), EADDRINUSE);
@@ -47,7 +47,7 @@ TEST(ListenSocket, ComesFromTheServiceManagerWhereThereIsOne)
 {
     testing::FLAGS_gtest_death_test_style = "threadsafe";
     const auto activated = [] {
-        test::TemporaryDirectory temporary;
+        platform::test::TemporaryDirectory temporary;
         auto passed = std::move(*ListenSocket::bindExclusive(temporary.path.string() + "/managed"));
         dup2(passed.fd(), 3);
         setenv("LISTEN_PID", std::to_string(getpid()).c_str(), 1);

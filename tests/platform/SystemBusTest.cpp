@@ -15,6 +15,7 @@
 #include "platform/net/NetworkStatus.h"
 #include "platform/net/NetworkStatusNetworkManager.h"
 #include "platform/run/RunLoop.h"
+#include "tests/support/ManualClock.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace platform {
