@@ -130,8 +130,10 @@ TEST_F(BagControllerTest, FailedFetchesLeaveTheOldBag)
         {[&] { lastTask()->respond(200, std::string(10000, '[')); }, nullptr, 0},
         {[&] { lastTask()->respond(200, "{\"a\": \"\xff\"}"); }, nullptr, 0},
     };
-    for (int version = 100; const auto& [fault, reason, code] : faults) {
-        controller().forceFetchBag(Value::dictionaryOf({{"bag", ++version}}));
+    for (const auto& [fault, reason, code] : faults) {
+        device.clock.setWall(device.clock.wallNow() + 14400s);
+        (void)controller().currentBag();
+        device.drain();
         errors.clear();
         fault();
         device.drain();
