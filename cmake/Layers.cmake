@@ -11,9 +11,10 @@ target_include_directories(house INTERFACE ${PROJECT_SOURCE_DIR})
 target_compile_options(house INTERFACE -Wall -Wextra -Wno-missing-field-initializers -Wnon-virtual-dtor
                        -Wimplicit-fallthrough $<$<NOT:$<CONFIG:Release>>:-Werror>)
 if(CMAKE_CXX_COMPILER_ID STREQUAL "GNU")
-  # g++ 12 reports false positives of these in optimised and instrumented builds, most of them in the standard library.
+  # g++ 12 reports false positives of these in optimised and instrumented builds, most of them in the standard library, and
+  # takes unnamed namespaces of sources that are compiled as one for those of a header.
   target_compile_options(house INTERFACE -Wshadow=local -Wno-restrict -Wno-array-bounds -Wno-stringop-overflow
-                         -Wno-maybe-uninitialized -Wno-tsan)
+                         -Wno-maybe-uninitialized -Wno-tsan -Wno-subobject-linkage)
 else()
   # Checks the attributes of platform/base/Mutex.h. Daily work is done with g++, which doesn't have the other warning.
   target_compile_options(house INTERFACE -Wthread-safety -Wno-unused-private-field)

@@ -49,7 +49,7 @@ Value valueOfError(const platform::Error& error)
 /// Returns the error's reason, and what to check next if that is known.
 std::string explain(const platform::Error& error)
 {
-    const std::string reason = printable(error.reason().empty() ? error.description() : error.reason());
+    std::string reason = printable(error.reason().empty() ? error.description() : error.reason());
     if (error.domain == TAVErrorDomain && error.code == TAVErrorTimeout)
         return reason + " (no bag yet; check its URL with \"tavrinctl defaults read TAVBagURL\")";
     return reason;
