@@ -375,7 +375,8 @@ TEST_F(DownloadManagerTest, NothingOvertakesABagThatWaitsForTheListOfDownloads)
     const auto slow = std::make_shared<SlowSession>();
     assembly.downloadURLSession = slow;
     const std::string hints = "TAVLookupHintsWeekly";
-    bag({{hints, "https://r.example/hints"}});
+    const std::string monthly = "TAVLookupHintsMonthly";
+    bag({{hints, "https://r.example/hints"}, {monthly, "https://r.example/monthly"}});
     device.notifications.post({.name = TAVSignificantLocationChange});
     device.drain();
     EXPECT_EQ(log.count("deleting resource: " + hints), 0);
@@ -383,8 +384,10 @@ TEST_F(DownloadManagerTest, NothingOvertakesABagThatWaitsForTheListOfDownloads)
     ASSERT_EQ(slow->answers.size(), 1u);
     slow->answers[0]({});
     device.drain();
-    EXPECT_EQ(log.count("deleting resource: " + hints), 1);
-    EXPECT_FALSE(manager->resourceForKey(hints)) << "the bag's resource was there first";
+    for (const std::string& identifier : {hints, monthly}) {
+        EXPECT_EQ(log.count("deleting resource: " + identifier), 1);
+        EXPECT_FALSE(manager->resourceForKey(identifier)) << "the bag's resource was there first";
+    }
 
     bag({{hints, "https://r.example/hints"}});
     device.advance(60s);
