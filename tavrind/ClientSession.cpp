@@ -107,7 +107,11 @@ bool ClientSession::_updateFirstUseDate()
         log(kLogSession).info("user default key not found for agent: {}", _header.agent);
         return false;
     }
-    _assembly.userDefaults.set(*key, *_header.baseTime); // written on the store's queue, whose disk no client waits for
+    _assembly.userDefaults.set(*key, *_header.baseTime);
+    // Not here: a client waits for its session.
+    _assembly.device.globalQueue(platform::Priority::Default)->async([&defaults = _assembly.userDefaults] {
+        (void)defaults.synchronize();
+    });
     if (const auto client = dailyActiveClient(*key))
         _assembly.diagnosticData.addValue(1, createCounterKey(*client, "dailyactiveusers"));
     return true;

@@ -90,8 +90,10 @@ void ClientStateManager::saveState()
 {
     if (!_persistSessions) return;
     stateCacheQueue->async([self = shared_from_this()] {
-        // Written on the store's queue: clients wait for this one.
         self->_assembly.userDefaults.set(kSessionsKey, self->_sessions());
+        // Not here: clients wait for this queue.
+        self->_assembly.device.globalQueue(platform::Priority::Default)
+            ->async([&defaults = self->_assembly.userDefaults] { (void)defaults.synchronize(); });
     });
 }
 
