@@ -53,8 +53,8 @@ public:
 /// one whose criteria don't hold, in five minutes. An activity that doesn't repeat is removed after its run.
 ///
 /// Due times are saved on disk under the identifier before a run starts: a daemon that is often started and killed
-/// still runs its activities, and no more often. They are counts of `LivedTime`, so that setting the system clock
-/// changes nothing. No activity runs earlier than its delay after its registration.
+/// runs its activities as often as one that keeps running. They are values of `LivedTime`, so that setting the system
+/// clock changes nothing. No activity runs earlier than its delay after its registration.
 ///
 /// The only wake-up is a timer for the next due activity. Handlers run on worker threads. Any thread.
 class ActivityScheduler {

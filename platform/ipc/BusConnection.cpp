@@ -524,7 +524,7 @@ void BusConnection::updateWatch()
     if (!_watch || _state == State::Closed) return;
     const int wanted = sd_bus_get_events(_bus.get());
     if (wanted < 0) return driveAgainLater();
-    // Watches for a disconnect even while it doesn't read.
+    // Reports a disconnect even while reading is paused.
     std::uint32_t events = static_cast<std::uint32_t>(wanted) | EPOLLHUP;
     const bool reads = !_authenticated || !_input->betweenMessages() || !paused();
     if (reads)

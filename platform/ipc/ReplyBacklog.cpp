@@ -9,7 +9,7 @@ namespace platform::ipc {
 
 namespace {
 
-/// Only the event ends a wait; the clock needs a finite number.
+/// Longer than any wait: only the event ends one. Duration::max() would overflow when it is added to a time.
 constexpr Duration kForever = std::chrono::years(1);
 
 constexpr std::size_t kHandleCost = 16u << 10;

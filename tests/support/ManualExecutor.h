@@ -1,7 +1,5 @@
 #pragma once
 
-#include <chrono>
-#include <condition_variable>
 #include <deque>
 #include <mutex>
 
@@ -18,24 +16,12 @@ public:
             std::lock_guard lock(_mutex);
             _jobs.push_back(std::move(job));
         }
-        _added.notify_all();
     }
 
     /// Runs jobs until there are none, those that they add included.
     void drain()
     {
         while (Job job = take()) job();
-    }
-    /// Runs jobs, those that come from other threads meanwhile included, until `done()`. False after 30 s.
-    template <class Done> [[nodiscard]] bool drainUntil(Done done)
-    {
-        const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(30);
-        while (true) {
-            drain();
-            if (done()) return true;
-            std::unique_lock lock(_mutex);
-            if (!_added.wait_until(lock, end, [this] { return !_jobs.empty(); })) return false;
-        }
     }
 
 private:
@@ -49,7 +35,6 @@ private:
     }
 
     std::mutex _mutex;
-    std::condition_variable _added;
     std::deque<Job> _jobs;
 };
 
