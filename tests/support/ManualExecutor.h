@@ -12,10 +12,8 @@ class ManualExecutor final : public Executor {
 public:
     void execute(Priority, Job job) override
     {
-        {
-            std::lock_guard lock(_mutex);
-            _jobs.push_back(std::move(job));
-        }
+        std::lock_guard lock(_mutex);
+        _jobs.push_back(std::move(job));
     }
 
     /// Runs jobs until there are none, those that they add included.
