@@ -129,7 +129,7 @@ struct CounterStore::Impl : std::enable_shared_from_this<Impl> {
         }
         const auto contents = parseJson(bytes->view(), kMaximumCountersSize);
         if (!contents || !contents->asDictionary())
-            return defaultLog().error("counters {} are broken, starting at 0", path.string());
+            return defaultLog().error("counters {} are damaged, starting at 0", path.string());
         MutexLock lock(mutex);
         for (const auto& [key, count] : *contents->asDictionary())
             if (const auto number = count.asInt(); number && counters.size() < kMaximumCounters)

@@ -74,7 +74,8 @@ struct FileWatch::Impl {
                 return 0;
             };
             if (const int added = sd_event_add_inotify(loop, &events, next.c_str(), kChanges, note, this); added < 0)
-                defaultLog().error("changes of {} go unseen: {}", path.string(), std::strerror(-added));
+                defaultLog().error("cannot watch {}, its changes are not noticed: {}", path.string(),
+                                   std::strerror(-added));
         }
     }
 

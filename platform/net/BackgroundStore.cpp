@@ -162,7 +162,7 @@ Result<std::unique_ptr<BackgroundStore>> BackgroundStore::open(FileSystem& files
     std::unique_ptr<BackgroundStore> store(new BackgroundStore(files, directory, std::move(*lock)));
     auto database = store->openDatabase();
     if (!database && Sqlite::isDamage(database.error())) {
-        defaultLog().error("background transfers {} are damaged and begun anew: {}", directory.string(),
+        defaultLog().error("background transfers {} are damaged, starting with an empty list: {}", directory.string(),
                            database.error().description());
         store->_database.reset();
         store->_contents = {};

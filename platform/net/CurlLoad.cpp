@@ -57,9 +57,10 @@ CurlLoad::TimePoint CurlLoad::deadline() const
 
 void CurlLoad::timeOut(TimePoint now)
 {
-    _error = now >= *_began + _configuration.totalTimeout
-                 ? urlError(kUrlTimedOut, fmt::format("not whole after {:g} s", toSeconds(_configuration.totalTimeout)))
-                 : urlError(kUrlTimedOut, fmt::format("nothing received for {:g} s", toSeconds(timeout())));
+    _error =
+        now >= *_began + _configuration.totalTimeout
+            ? urlError(kUrlTimedOut, fmt::format("not complete after {:g} s", toSeconds(_configuration.totalTimeout)))
+            : urlError(kUrlTimedOut, fmt::format("nothing received for {:g} s", toSeconds(timeout())));
 }
 
 void CurlLoad::giveWay()

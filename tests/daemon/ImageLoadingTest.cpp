@@ -171,6 +171,15 @@ TEST_F(ImageFetchesTest, NoHostTakesMoreThanItsShare)
     EXPECT_EQ(end("h1/1"), Strings{"h1/11"}) << "the tenth has begun";
 }
 
+TEST_F(ImageFetchesTest, AFullLaneTakesNoMore)
+{
+    EXPECT_TRUE(add("ahead/1"));
+    for (std::size_t i = 0; i < ImageFetches::kWaiting; ++i) EXPECT_TRUE(add(on(i % 99, i), client));
+    EXPECT_FALSE(add("h1/x", client));
+    EXPECT_TRUE(join("ahead/1", client) && begun().back() == "ahead/1") << "it stays in its lane, and is awaited";
+    EXPECT_TRUE(add("ahead/2"));
+}
+
 // ---- The daemon
 
 struct ImageLoadingTest : DaemonTest {

@@ -255,6 +255,8 @@ TEST_F(UploadTest, AnOutcomeIsOnDiskBeforeTheUploadIsForgottenAndIsBookedOnce)
         const auto& file = device.files.files.at("/state/com.quorvane.tavrind/feedback-books.json");
         EXPECT_EQ(platform::parseJson(file).value()["sent"], Value(sent + 2));
         EXPECT_EQ(counter("feedbacksent") - counted, 7);
+        const auto& counters = device.files.files.at("/state/counters.json");
+        EXPECT_EQ(platform::parseJson(counters).value()["com.quorvane.tavrind.feedbacksent"], Value(counted + 7));
         restart();
     }
     EXPECT_EQ(booked(FeedbackFate::Sent), sent + 2);

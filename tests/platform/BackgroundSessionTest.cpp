@@ -304,7 +304,7 @@ TEST_F(BackgroundSessionTest, ADamagedStoreIsBegunAnew)
         next.answer(200);
         EXPECT_EQ(next.told().size(), 2u) << name;
     }
-    EXPECT_EQ(log.count("are damaged and begun anew"), 5) << "an empty file is a new store";
+    EXPECT_EQ(log.count("are damaged, starting with an empty list"), 5) << "an empty file is a new store";
 }
 
 TEST_F(BackgroundSessionTest, WhereTheStoreCantBeUsedTasksWorkAndEndWithTheProcess)

@@ -56,9 +56,9 @@ TEST_F(CountersTest, DamagedFilesCostNoMoreThanTheyMust)
         std::map<std::string, std::int64_t> read;
         const char* logged;
     } cases[]{{R"({"a": 1, "b": "x", "c": null, "d": 1.5, "e": 3})", {{"a", 1}, {"e", 3}}, nullptr},
-              {R"({"a": 1)", {}, "are broken"},
-              {"[]", {}, "are broken"},
-              {"", {}, "are broken"},
+              {R"({"a": 1)", {}, "are damaged"},
+              {"[]", {}, "are damaged"},
+              {"", {}, "are damaged"},
               {std::string(64 << 20, ' '), {}, "can't be read"}};
     for (const auto& c : cases) {
         files.files[path] = c.file;

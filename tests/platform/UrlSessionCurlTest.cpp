@@ -381,7 +381,7 @@ TEST_F(CurlLoaderTest, LoadsAreLimitedInTimeInAll)
     TestHttpServer server(always({"HTTP/1.1 200 OK\r\nContent-Length: 9\r\n\r\nhel"}));
     const Outcome outcome = load(server.url(), {.requestTimeout = 20s, .totalTimeout = 100ms});
     EXPECT_EQ(outcome.code(), kUrlTimedOut);
-    EXPECT_EQ(outcome.error.value_or(Error()).reason(), "not whole after 0.1 s");
+    EXPECT_EQ(outcome.error.value_or(Error()).reason(), "not complete after 0.1 s");
 }
 
 // One task that hangs must hold back neither the others nor their time-outs.

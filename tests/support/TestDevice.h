@@ -121,7 +121,7 @@ struct TestDevice : ByHand {
     UserDefaults userDefaults;
     UserDefaults lookupDefaults;
     NotificationCenter notifications;
-    CounterStore counters;
+    CounterStore counters{files, "/state/counters.json", makeQueue("counters")};
     Transactions transactions;
     FakeLocale locale;
     FakeLocation location;
