@@ -33,14 +33,22 @@ void append(ipc::Message& message, Value value)
     message.args.push_back(std::move(value));
 }
 
+void append(ipc::Message& message, std::shared_ptr<const platform::Record> record)
+{
+    if (!record) return append(message, Value(Dictionary()));
+    message.args.emplace_back();
+    message.records.resize(message.args.size());
+    message.records.back() = std::move(record);
+}
+
 void append(ipc::Message& message, const platform::Record& record)
 {
-    message.args.push_back(platform::toValue(record));
+    append(message, std::shared_ptr<const platform::Record>(std::shared_ptr<void>(), &record));
 }
 
 void append(ipc::Message& message, const std::shared_ptr<const TAVBag>& bag)
 {
-    message.args.push_back(bag ? platform::toValue(TAVBagRecord(*bag)) : Value(Dictionary()));
+    append(message, bag ? std::make_shared<const TAVBagRecord>(*bag) : nullptr);
 }
 
 void append(ipc::Message& message, const OptionalError& error)
@@ -56,6 +64,15 @@ void append(ipc::Message& message, platform::FileHandle file)
         message.handles.push_back(std::move(file));
     }
     message.args.emplace_back(std::move(indexes));
+}
+
+Result<std::shared_ptr<platform::Record>> takeRecord(ipc::Message& message, std::size_t index)
+{
+    // The message is the only owner of what it was decoded into.
+    if (message.record(index)) return std::const_pointer_cast<platform::Record>(std::move(message.records[index]));
+    const Value& value = message.args[index];
+    if (value.count() == 0) return nullptr;
+    return platform::recordFromValue(value, coreRecordClasses());
 }
 
 template <> Result<std::string> Take<std::string>::from(ipc::Message& message, std::size_t index)

@@ -57,6 +57,19 @@ template <class... T> constexpr std::string_view signatureOf()
     return {kSignatureText<T...>.data(), kSignatureText<T...>.size() - 1};
 }
 
+/// Whether arguments of a type are sent as records. A bag is sent as a `TAVBagRecord`.
+template <class T> inline constexpr bool kIsRecord = false;
+template <class T> inline constexpr bool kIsRecord<std::shared_ptr<T>> = true;
+
+/// Returns which arguments of these types are records.
+template <class... T> constexpr platform::ipc::RecordArguments recordsIn()
+{
+    platform::ipc::RecordArguments records{.classes = coreRecordClasses};
+    [[maybe_unused]] std::uint32_t bit = 1;
+    ((records.which |= kIsRecord<T> ? bit : 0, bit <<= 1), ...);
+    return records;
+}
+
 /// Appends one argument to a message.
 template <class T>
     requires std::is_constructible_v<platform::Value, T>
@@ -66,19 +79,14 @@ void append(platform::ipc::Message& message, T value)
 }
 /// Appends a dictionary; any other value is sent as an empty one.
 void append(platform::ipc::Message& message, platform::Value value);
+void append(platform::ipc::Message& message, std::shared_ptr<const platform::Record> record);
+/// The record must outlive the message.
 void append(platform::ipc::Message& message, const platform::Record& record);
 void append(platform::ipc::Message& message, const std::shared_ptr<const TAVBag>& bag);
 void append(platform::ipc::Message& message, const OptionalError& error);
 void append(platform::ipc::Message& message, platform::FileHandle file);
-template <class R>
-    requires std::is_base_of_v<platform::Record, R>
-void append(platform::ipc::Message& message, const std::shared_ptr<R>& record)
-{
-    if (record)
-        append(message, *record);
-    else
-        append(message, OptionalError());
-}
+/// Takes the record at `index` out of the message, or decodes it from its dictionary. Returns null for an empty one.
+platform::Result<std::shared_ptr<platform::Record>> takeRecord(platform::ipc::Message& message, std::size_t index);
 
 /// Decodes the argument at `index`, and may move it out of the message. The message must have the row's signature.
 /// Fails for a record that can't be decoded or that reports a `problem()`. A record of an unknown class, or of a class
@@ -89,12 +97,10 @@ template <class T> struct Take {
 template <class R> struct Take<std::shared_ptr<R>> {
     static platform::Result<std::shared_ptr<R>> from(platform::ipc::Message& message, std::size_t index)
     {
-        const platform::Value& value = message.args[index];
-        if (value.count() == 0) return nullptr;
-        auto record = platform::castRecord<R>(platform::recordFromValue(value, coreRecordClasses()));
+        auto record = platform::castRecord<R>(takeRecord(message, index));
         if (!record && record.error().code == platform::Decoder::kUnknownClass) return nullptr;
         if constexpr (requires { (*record)->problem(); })
-            if (auto problem = record ? (*record)->problem() : std::nullopt)
+            if (auto problem = record && *record ? (*record)->problem() : std::nullopt)
                 return std::unexpected(platform::Error::withReason(std::string(platform::kFormatErrorDomain),
                                                                    platform::Decoder::kMalformed, std::move(*problem)));
         return record;
@@ -145,7 +151,9 @@ template <class... I, class... O> struct Method<In<I...>, Out<O...>> : platform:
                  .in = wire::signatureOf<I...>(),
                  .out = wire::signatureOf<O...>(),
                  .inNames = inNames_,
-                 .outNames = outNames_}
+                 .outNames = outNames_,
+                 .inRecords = wire::recordsIn<I...>(),
+                 .outRecords = wire::recordsIn<O...>()}
     {}
 
     /// Returns this method as a member of the interface `home` instead of its object's main one.
@@ -163,7 +171,7 @@ template <class... I, class... O> struct Method<In<I...>, Out<O...>> : platform:
         return method;
     }
 
-    /// Encodes a call. Records may be passed by reference.
+    /// Encodes a call. Records may be passed by reference; they must outlive the message.
     template <class... Given> [[nodiscard]] static platform::ipc::Message call(Given&&... arguments)
     {
         static_assert(sizeof...(Given) == sizeof...(I));

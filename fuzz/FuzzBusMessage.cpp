@@ -1,5 +1,3 @@
-#include <sys/socket.h>
-
 #include <systemd/sd-bus.h>
 
 #include "fuzz/Check.h"
@@ -7,25 +5,11 @@
 #include "platform/ipc/BusMessage.h"
 #include "platform/values/Dictionary.h"
 #include "platform/values/Json.h"
+#include "tests/support/BusMessages.h"
 
 using namespace platform;
 
 namespace {
-
-/// A message to nobody; it can be filled, sealed and read.
-ipc::BusMessage newMessage()
-{
-    static sd_bus* const bus = [] {
-        int ends[2] = {};
-        sd_bus* made = nullptr;
-        check(socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0, ends) == 0);
-        check(sd_bus_new(&made) >= 0 && sd_bus_set_fd(made, ends[0], ends[0]) >= 0 && sd_bus_start(made) >= 0);
-        return made;
-    }();
-    sd_bus_message* message = nullptr;
-    check(sd_bus_message_new_method_call(bus, &message, nullptr, "/a", "a.b", "C") >= 0);
-    return ipc::BusMessage(message);
-}
 
 /// At least this deep a message may nest; the protocol counts variants and entries, too.
 constexpr std::size_t kSafeDepth = 20;
@@ -40,7 +24,7 @@ void runInput(std::string_view input)
     if (!json || !json->asDictionary()) return;
     const Value value = fuzz::enriched(*json);
 
-    const auto message = newMessage();
+    const auto message = test::newBusMessage();
     const auto written = ipc::encodeArguments(message.get(), "a{sv}", {.args = {value}, .handles = {}});
     if (!written) {
         check(!written.error().empty() && fuzz::depthOf(value) > kSafeDepth, written.error());

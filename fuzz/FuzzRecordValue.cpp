@@ -9,7 +9,9 @@ void runInput(std::string_view input)
 {
     const auto value = platform::parseJson(input);
     if (!value) return;
-    const auto record = platform::recordFromValue(fuzz::enriched(*value), tavrin::tavrindRecordClasses());
+    const platform::Value dictionary = fuzz::enriched(*value);
+    const auto record = platform::recordFromValue(dictionary, tavrin::tavrindRecordClasses());
+    fuzz::checkBus(dictionary, record.value_or(nullptr));
     if (!record) return fuzz::checkRefusal(record.error());
     fuzz::checkRoundTrips(**record);
     fuzz::checkUpload(*record);

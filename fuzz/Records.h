@@ -8,6 +8,7 @@
 #include "platform/values/ValueCoder.h"
 #include "tavrind/SessionProcessingHelper.h"
 #include "tavrind/TavrinFeedback.h"
+#include "tests/support/BusMessages.h"
 
 namespace fuzz {
 
@@ -22,6 +23,22 @@ inline void checkRoundTrips(const platform::Record& record)
         check(again.has_value(), again ? "" : again.error().description());
         check(platform::archive(**again) == bytes, std::string(record.className()));
     }
+}
+
+/// Checks that a record crosses the bus as its dictionary does, and that a dictionary from the bus is read as its
+/// values are.
+inline void checkBus(const platform::Value& dictionary, const std::shared_ptr<platform::Record>& record)
+{
+    bool direct = false;
+    if (dictionary.asDictionary())
+        if (const auto message = platform::test::sealedMessage({.args = {dictionary}, .handles = {}, .records = {}})) {
+            const std::string difference =
+                platform::test::differenceOfRoads(message, tavrin::tavrindRecordClasses, direct);
+            check(difference.empty(), difference);
+        }
+    if (!record) return;
+    const std::string difference = platform::test::differenceOfMessages(record);
+    check(difference.empty(), difference);
 }
 
 /// Checks that a record of an event can be uploaded.

@@ -6,7 +6,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/ipc/BusMessage.h"
+#include "platform/ipc/BusValue.h"
 #include "platform/values/Dictionary.h"
 #include "platform/values/Value.h"
 

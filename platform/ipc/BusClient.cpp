@@ -46,13 +46,13 @@ bool waitForInput(sd_bus* bus, int descriptor, std::uint64_t now, std::uint64_t 
 }
 
 /// Decodes a received message; fails if it doesn't have `signature`.
-CallResult decodeAs(sd_bus_message* message, std::string_view signature)
+CallResult decodeAs(sd_bus_message* message, std::string_view signature, const RecordArguments& records)
 {
     const char* actual = sd_bus_message_get_signature(message, true);
     if (!actual || signature != actual)
         return std::unexpected(CallError{SD_BUS_ERROR_INVALID_SIGNATURE, fmt::format("the answer is \"{}\", not \"{}\"",
                                                                                      actual ? actual : "", signature)});
-    auto decoded = decodeArguments(message, kMaximumPeerAnswer);
+    auto decoded = decodeArguments(message, kMaximumPeerAnswer, records);
     if (!decoded) return std::unexpected(std::move(decoded.error()));
     return std::move(decoded->message);
 }
@@ -65,10 +65,11 @@ struct Client::Impl {
     };
     /// A call that was sent; owned by its bus slot.
     struct PendingCall {
-        PendingCall(std::string signature_, Answer answer_)
-            : signature(std::move(signature_)), answer(std::move(answer_))
+        PendingCall(const Member& member, Answer answer_)
+            : signature(member.out), records(member.outRecords), answer(std::move(answer_))
         {}
-        std::string signature;
+        std::string signature; ///< of the answer
+        RecordArguments records;
         Answer answer;
     };
 
@@ -96,12 +97,13 @@ struct Client::Impl {
     static int onReply(sd_bus_message* message, void* userdata, sd_bus_error*)
     {
         // sd-bus destroys the slot, and with it the call, after this returns. The answer may make new calls.
-        Answer answer = std::move(static_cast<PendingCall*>(userdata)->answer);
+        auto& call = *static_cast<PendingCall*>(userdata);
+        Answer answer = std::move(call.answer);
         if (!answer) return 0;
         if (const sd_bus_error* error = sd_bus_message_get_error(message))
             answer(std::unexpected(CallError{error->name ? error->name : "", error->message ? error->message : ""}));
         else
-            answer(decodeAs(message, static_cast<PendingCall*>(userdata)->signature));
+            answer(decodeAs(message, call.signature, call.records));
         return 0;
     }
 };
@@ -163,7 +165,7 @@ void Client::call(std::string_view interface, const Member& member, Message argu
         if (result < 0) fail(std::strerror(-result));
         return;
     }
-    auto pending = std::make_unique<Impl::PendingCall>(std::string(member.out), std::move(answer));
+    auto pending = std::make_unique<Impl::PendingCall>(member, std::move(answer));
     sd_bus_slot* slot = nullptr;
     const std::uint64_t wait = timeout ? std::max<std::uint64_t>(microseconds(*timeout), 1) : UINT64_MAX;
     result = sd_bus_call_async(_impl->bus.get(), &slot, raw, &Impl::onReply, pending.get(), wait);

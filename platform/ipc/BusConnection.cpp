@@ -380,7 +380,7 @@ void BusConnection::receive(sd_bus_message* message, const Member& member)
     std::expected<DecodedArguments, CallError> decoded;
     const char* signature = sd_bus_message_get_signature(message, true);
     if (signature && member.in == signature)
-        decoded = decodeArguments(message, _context->limits.messageSize * kDecodedShare);
+        decoded = decodeArguments(message, _context->limits.messageSize * kDecodedShare, member.inRecords);
     else
         decoded = std::unexpected(CallError{
             .message = fmt::format("{} takes \"{}\", not \"{}\"", member.name, member.in, signature ? signature : "")});

@@ -23,22 +23,19 @@ struct DecodedArguments {
     std::size_t size = 0; ///< estimated bytes of memory
 };
 
-/// The most file handles that one message may carry.
-inline constexpr std::size_t kMaximumHandles = 16;
-
 /// Reads all arguments of a received message by the message's signature. Variants may contain numbers, texts, byte
 /// strings, arrays, and dictionaries with string keys. File handles are duplicated; a variant can't contain one. The
 /// error names the argument; it is LimitsExceeded if the values take more than `maximumSize` bytes.
-[[nodiscard]] std::expected<DecodedArguments, CallError> decodeArguments(sd_bus_message* message,
-                                                                         std::size_t maximumSize);
+///
+/// The arguments of `records` are read straight into records. If one can't be read, all are left as dictionaries.
+[[nodiscard]] std::expected<DecodedArguments, CallError>
+decodeArguments(sd_bus_message* message, std::size_t maximumSize, const RecordArguments& records = {});
 
 /// Appends `message` to a new bus message by `signature` and returns its estimated size in bytes. A null argument is
 /// sent as the zero of its type; see `Message` for null inside containers. Texts pass through `busText`. If a value
-/// doesn't fit its type, returns an error that names the argument; the bus message is then unusable.
+/// doesn't fit its type, returns an error that names the argument; the bus message is then unusable. A record is sent
+/// like its `toValue`.
 [[nodiscard]] std::expected<std::size_t, std::string> encodeArguments(sd_bus_message* bus, std::string_view signature,
                                                                       const Message& message);
-
-/// Replaces invalid UTF-8, U+0000 and noncharacters, which sd-bus rejects, by U+FFFD.
-[[nodiscard]] std::string busText(std::string_view text);
 
 } // namespace platform::ipc

@@ -6,6 +6,8 @@
 #include <systemd/sd-bus.h>
 #include <systemd/sd-id128.h>
 
+#include "platform/ipc/BusValue.h"
+
 namespace platform::ipc {
 
 namespace {

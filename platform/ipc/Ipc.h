@@ -16,6 +16,11 @@
 #include "platform/values/Error.h"
 #include "platform/values/Value.h"
 
+namespace platform {
+class Record;
+class RecordClasses;
+} // namespace platform
+
 /// Local IPC: the D-Bus protocol, peer to peer over Unix sockets, implemented with sd-bus.
 ///
 /// A server is a `Listener` that accepts `Connection`s. Each connection exports one object, which handles method calls,
@@ -34,6 +39,23 @@ namespace platform::ipc {
 struct Message {
     std::vector<Value> args;
     std::vector<FileHandle> handles;
+    /// Records in place of dictionaries, by the index of the argument, which is then null in `args`. Null, or beyond
+    /// the end, for other arguments. A record doesn't change as long as the message lives.
+    std::vector<std::shared_ptr<const Record>> records;
+
+    /// Returns the record of an argument, or null.
+    [[nodiscard]] const Record* record(std::size_t index) const
+    {
+        return index < records.size() ? records[index].get() : nullptr;
+    }
+};
+
+/// Which arguments of a message are records, and of which classes.
+struct RecordArguments {
+    std::uint32_t which = 0; ///< bit i is set for argument i
+    const RecordClasses& (*classes)() = nullptr;
+
+    [[nodiscard]] constexpr bool has(std::size_t index) const { return index < 32 && (which >> index & 1) != 0; }
 };
 
 /// One member of an interface, with D-Bus signatures of its arguments.
@@ -45,6 +67,8 @@ struct Member {
     std::string_view interface = {}; ///< to which the member belongs; if empty, `Interface::name`
     std::string_view inNames = {};   ///< names of the arguments of `in`, separated by blanks; for error texts
     std::string_view outNames = {};
+    RecordArguments inRecords = {}; ///< decoded without a dictionary in between
+    RecordArguments outRecords = {};
 };
 
 /// The methods of an exported object, and the signals that it pushes. Texts must outlive the transport.

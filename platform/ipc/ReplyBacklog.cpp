@@ -4,6 +4,7 @@
 #include <utility>
 
 #include "platform/values/Dictionary.h"
+#include "platform/values/Record.h"
 
 namespace platform::ipc {
 
@@ -26,13 +27,37 @@ std::size_t memoryOf(const Value& value)
     return size;
 }
 
+/// Adds up the memory of a record's values.
+class MemoryCounter final : public Encoder {
+public:
+    void beginRecord(std::string_view, std::size_t) override { size += sizeof(Value); }
+    void key(std::string_view name) override { size += sizeof(std::string) + name.size(); }
+    void endRecord() override {}
+    void beginArray(std::size_t) override { size += sizeof(Value); }
+    void endArray() override {}
+    void null() override { size += sizeof(Value); }
+    void boolean(bool) override { size += sizeof(Value); }
+    void integer(std::int64_t) override { size += sizeof(Value); }
+    void unsignedInteger(std::uint64_t) override { size += sizeof(Value); }
+    void real(double) override { size += sizeof(Value); }
+    void string(std::string_view text) override { size += sizeof(Value) + text.size(); }
+    void bytes(const Bytes& bytes) override { size += sizeof(Value) + bytes.size(); }
+    void date(Date) override { size += sizeof(Value); }
+    void value(const Value& value) override { size += memoryOf(value); }
+
+    std::size_t size = 0;
+};
+
 } // namespace
 
 std::size_t memoryOf(const Message& message)
 {
     std::size_t size = message.handles.size() * kHandleCost;
     for (const Value& argument : message.args) size += memoryOf(argument);
-    return size;
+    MemoryCounter records;
+    for (const auto& record : message.records)
+        if (record) encodeRecord(records, *record);
+    return size + records.size;
 }
 
 void ReplyBacklog::runWithRoom(Queue::Task task)

@@ -6,6 +6,7 @@
 #include <systemd/sd-bus.h>
 
 #include "platform/ipc/BusMessage.h"
+#include "platform/ipc/BusValue.h"
 #include "platform/run/RunLoop.h"
 
 namespace platform::ipc {

@@ -249,7 +249,7 @@ public:
             return static_cast<double>(take(Value::Type::UInt, "a double").unsignedInteger);
         return take(Value::Type::Double, "a double").real;
     }
-    std::string string() override { return std::string(take(Value::Type::String, "a string").text()); }
+    std::string_view string() override { return take(Value::Type::String, "a string").text(); }
     Bytes bytes() override { return Bytes(std::string(take(Value::Type::Bytes, "bytes").text())); }
     Date date() override { return Date(Duration(take(Value::Type::Date, "a date").integer)); }
     Value value() override { return value(kMaximumDepth); }
@@ -282,7 +282,7 @@ public:
             Dictionary dictionary;
             dictionary.reserve(token.size);
             for (std::uint32_t i = 0; i < token.size; ++i) {
-                std::string key = string();
+                std::string key(string());
                 dictionary.set(std::move(key), value(levels - 1));
             }
             return dictionary;

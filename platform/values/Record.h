@@ -79,7 +79,8 @@ public:
     virtual std::int64_t integer() = 0;
     virtual std::uint64_t unsignedInteger() = 0;
     virtual double real() = 0;
-    virtual std::string string() = 0;
+    /// The text is valid as long as the input.
+    virtual std::string_view string() = 0;
     virtual Bytes bytes() = 0;
     virtual Date date() = 0;
     virtual Value value() = 0;
@@ -92,8 +93,8 @@ public:
     /// Moves to the next field and sets `name`, which is valid as long as the input. At the end, leaves the record and
     /// returns false.
     virtual bool nextKey(std::string_view& name) = 0;
-    /// Enters an array and returns an upper bound of its size for which memory may safely be reserved. Call
-    /// `nextElement` until it returns false.
+    /// Enters an array and returns the number of elements for which memory may safely be reserved; 0 if it is unknown.
+    /// Call `nextElement` until it returns false.
     virtual std::size_t beginArray() = 0;
     /// Moves to the next element. At the end, leaves the array and returns false.
     virtual bool nextElement() = 0;
@@ -358,10 +359,11 @@ private:
     }
 };
 
-/// Casts a decoded record to `T`; returns an error if it is of another class. Passes an error on.
+/// Casts a decoded record to `T`; returns an error if it is of another class. Passes null and an error on.
 template <class T> [[nodiscard]] Result<std::shared_ptr<T>> castRecord(Result<std::shared_ptr<Record>> record)
 {
     if (!record) return std::unexpected(std::move(record.error()));
+    if (!*record) return nullptr;
     if (auto cast = std::dynamic_pointer_cast<T>(*record)) return cast;
     return std::unexpected(Error::withReason(std::string(kFormatErrorDomain), Decoder::kUnknownClass,
                                              "unexpected class " + std::string((*record)->className())));

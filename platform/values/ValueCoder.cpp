@@ -79,8 +79,18 @@ public:
         return take(_here->type() == Value::Type::Double ? std::nullopt : _here->asUInt(), "an integer");
     }
     double real() override { return take(_here->asDouble(), "a double"); }
-    std::string string() override { return takeContents(_here->asString(), "a string"); }
-    Bytes bytes() override { return takeContents(_here->asBytes(), "bytes"); }
+    std::string_view string() override
+    {
+        const std::string* found = _here->asString();
+        if (!found) failExpecting("a string", _here->type());
+        return found ? *found : std::string_view();
+    }
+    Bytes bytes() override
+    {
+        const Bytes* found = _here->asBytes();
+        if (!found) failExpecting("bytes", _here->type());
+        return found ? *found : Bytes();
+    }
     Date date() override
     {
         if (_here->isNumber()) return dateFromSecondsSince1970(*_here->asDouble());
@@ -144,12 +154,6 @@ private:
     {
         if (!found) failExpecting(expected, _here->type());
         return found.value_or(T());
-    }
-
-    template <class T> T takeContents(const T* found, std::string_view expected)
-    {
-        if (!found) failExpecting(expected, _here->type());
-        return found ? *found : T();
     }
 
     bool enter(Open open)

@@ -18,6 +18,7 @@
 #include "tavrind/TavrinFeedback.h"
 #include "tavrind/TavrinSessionFeedback.h"
 #include "tests/records/RecordFilling.h"
+#include "tests/support/BusMessages.h"
 
 namespace tavrin {
 namespace {
@@ -104,6 +105,77 @@ TEST(RecordClasses, EveryFieldSurvivesBothCodersUnderANameOfItsOwn)
             EXPECT_EQ(platform::archive(**decoded), platform::archive(record));
         }
     });
+}
+
+TEST(RecordClasses, EveryRecordCrossesTheBusAsItsDictionaryDoes)
+{
+    for (const auto& [name, make] : coreRecordClasses()) {
+        SCOPED_TRACE(name);
+        const std::shared_ptr<platform::Record> record = make();
+        for (const bool filled : {false, true}) {
+            if (filled) fill(*record, coreRecordClasses());
+            bool direct = false;
+            EXPECT_EQ(platform::test::differenceOfMessages(record), "");
+            const auto message = platform::test::sealedMessage({.args = {Value()}, .handles = {}, .records = {record}});
+            EXPECT_EQ(platform::test::differenceOfRoads(message, coreRecordClasses, direct), "");
+            EXPECT_TRUE(direct);
+        }
+    }
+}
+
+TEST(RecordClasses, WhatOtherClientsSendIsReadFromTheBusAsItsDictionaryIs)
+{
+    const auto expectSame = [](bool expected, unsigned entries, auto... rest) {
+        const auto message = platform::test::newBusMessage();
+        ASSERT_GE(sd_bus_message_append(message.get(), "a{sv}", entries, rest...), 0);
+        ASSERT_GE(sd_bus_message_seal(message.get(), 1, 0), 0);
+        bool direct = false;
+        EXPECT_EQ(platform::test::differenceOfRoads(message, coreRecordClasses, direct), "");
+        EXPECT_EQ(direct, expected);
+    };
+    const auto withField = [&](bool expected, const char* className, auto... field) {
+        SCOPED_TRACE(className);
+        expectSame(expected, 2u, "class", "s", className, field...);
+    };
+    // numbers of any width, other texts, arrays of one type, and keys that no record has
+    withField(true, "ZRSearchResult", "queryId", "y", 7);
+    withField(true, "ZRSearchResult", "queryId", "n", 7);
+    withField(true, "ZRSearchResult", "queryId", "t", UINT64_MAX);
+    withField(true, "ZRSearchResult", "type", "t", std::uint64_t{7});
+    withField(true, "ZRSearchResult", "rankingScore", "u", 7);
+    withField(true, "ZRSearchResult", "rankingScore", "t", UINT64_MAX);
+    withField(true, "ZRSearchResult", "identifier", "o", "/a");
+    withField(true, "ZRSearchResult", "localFeatures", "v", "a{ss}", 1, "k", "x");
+    withField(false, "ZRSearchResult", "localFeatures", "(ii)", 1, 2);
+    withField(true, "ZRPunchout", "urls", "as", 2, "a:", "b:");
+    withField(true, "ZRPunchout", "urls", "av", 2, "s", "a:", "g", "a{sv}");
+    withField(true, "ZRVisibleResultsFeedback", "results", "aa{sv}", 1, 1, "class", "s", "ZRSearchResult");
+    withField(true, "ZRVisibleResultsFeedback", "results", "av", 1, "a{sv}", 1, "class", "s", "ZRSearchResult");
+    withField(true, "ZRSearchResult", "unheardOf", "aas", 1, 1, "x");
+    withField(false, "ZRSearchResult", "unheardOf", "(ii)", 1, 2);
+    // what doesn't fit
+    withField(false, "ZRSearchResult", "queryId", "i", -7);
+    withField(false, "ZRSearchResult", "queryId", "d", 7.0);
+    withField(false, "ZRSearchResult", "type", "t", UINT64_MAX);
+    withField(false, "ZRSearchResult", "identifier", "ay", 1, 7);
+    withField(false, "ZRSearchResult", "publiclyIndexable", "x", std::int64_t{1});
+    withField(false, "ZRSearchResult", "title", "a{sv}", 0);
+    withField(false, "ZRSearchResult", "title", "a{sv}", 1, "class", "s", "ZRPunchout");
+    withField(false, "ZRPunchout", "urls", "ay", 1, 7);
+    withField(false, "ZRPunchout", "urls", "a{sv}", 0);
+    withField(false, "ZRVisibleResultsFeedback", "results", "av", 1, "a{sv}", 0);
+    withField(false, "TAVCardRequest", "cardURL", "s", "no URL");
+    withField(false, "ZRUnheardOf", "queryId", "t", std::uint64_t{7});
+    // what fits only a dictionary
+    expectSame(false, 0u);
+    expectSame(false, 1u, "class", "x", std::int64_t{7});
+    expectSame(false, 1u, "identifier", "s", "a");
+    expectSame(false, 2u, "identifier", "s", "a", "class", "s", "ZRSearchResult");
+    withField(false, "ZRSearchResult", "class", "s", "ZRPunchout");
+    withField(false, "ZRSearchResult", "queryId", "v", "x", std::int64_t{7});
+    expectSame(true, 3u, "class", "s", "ZRSearchResult", "queryId", "x", std::int64_t{1}, "queryId", "x",
+               std::int64_t{2});
+    expectSame(false, 3u, "class", "s", "ZRSearchResult", "queryId", "s", "one", "queryId", "x", std::int64_t{2});
 }
 
 TEST(RecordClasses, AnEventSurvivesARecordThatIsNoneOfAnEvent)

@@ -62,12 +62,12 @@ public:
     std::int64_t integer() override { return put(++_number), _number; }
     std::uint64_t unsignedInteger() override { return put(++_number), static_cast<std::uint64_t>(_number); }
     double real() override { return put(static_cast<double>(++_number) + 0.5), static_cast<double>(_number) + 0.5; }
-    std::string string() override
+    std::string_view string() override
     {
         // A text that is a URL fits fields of either type.
-        std::string text = "https://example.com/" + std::to_string(++_number);
-        put(text);
-        return text;
+        _text = "https://example.com/" + std::to_string(++_number);
+        put(_text);
+        return _text;
     }
     Bytes bytes() override
     {
@@ -118,6 +118,7 @@ private:
     const std::string _nested;
     std::int64_t& _number;
     int _left = 0;
+    std::string _text;
     Value _given;
 };
 
