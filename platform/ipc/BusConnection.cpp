@@ -218,11 +218,10 @@ void BusConnection::invalidate()
 bool BusConnection::paused() const
 {
     if (_state != State::Open) return true;
-    // A disconnected peer can't send more, and the kernel bounds what is left in the socket.
-    if (_peerGone) return false;
     const Limits& limits = _context->limits;
-    return _heldBack || _calls.size() >= limits.callsInFlight || _bytesInFlight >= limits.bytesInFlight ||
-           _unwrittenBytes >= limits.queuedBytes / 4 || (!_calls.empty() && _context->full(_peer.pid));
+    const bool deaf = !_peerGone && _unwrittenBytes >= limits.queuedBytes / 4;
+    return _heldBack || deaf || _calls.size() >= limits.callsInFlight || _bytesInFlight >= limits.bytesInFlight ||
+           (!_calls.empty() && _context->full(_peer.pid));
 }
 
 void BusConnection::ready(std::uint32_t events)
@@ -287,6 +286,7 @@ bool BusConnection::announceMessage()
 {
     if (paused()) {
         if (_state == State::Open) cancelTimer();
+        if (_peerGone) catchUp();
         updateWatch();
         return false;
     }
@@ -303,13 +303,27 @@ bool BusConnection::announceMessage()
     }
     const std::size_t cost = size * (1 + kDecodedShare);
     if (size > kSmallMessage && !_context->admits(_peer.pid, cost)) {
-        if (_peerGone) end("its last message exceeds the limits");
         _heldBack = true;
+        if (_peerGone) catchUp();
         updateWatch();
         return false;
     }
     hold(_receiving, cost);
     return true;
+}
+
+/// Forgets the pending calls of a peer that has gone when their handlers have been called, and reads on: nobody waits
+/// for the replies.
+void BusConnection::catchUp()
+{
+    if (_calls.empty() || std::exchange(_catchingUp, true)) return;
+    _queue->async([self = shared_from_this()] {
+        self->_context->loop.execute(Priority::Default, [self] {
+            self->_catchingUp = false;
+            self->dropCalls();
+            self->driveAgainLater();
+        });
+    });
 }
 
 void BusConnection::waitForMore()
@@ -531,6 +545,7 @@ void BusConnection::updateWatch()
         events |= EPOLLIN;
     else
         events &= ~static_cast<std::uint32_t>(EPOLLIN);
+    if (_peerGone && !reads) events = 0; // the disconnect is known
     if (events != std::exchange(_watchedEvents, events)) _watch->setEvents(events);
 }
 

@@ -102,6 +102,7 @@ private:
     void drive(bool writable);
     [[nodiscard]] bool feed();
     [[nodiscard]] bool announceMessage();
+    void catchUp();
     void waitForMore();
     int onMessage(sd_bus_message* message);
     void takeMessage(sd_bus_message* message);
@@ -149,6 +150,7 @@ private:
     std::unique_ptr<RunLoop::Watch> _watch;
     std::uint32_t _watchedEvents = 0;
     bool _peerGone = false;
+    bool _catchingUp = false;
     bool _driveQueued = false;
     bool _authenticated = false;
     bool _fed = false;        // sd-bus may have unread input

@@ -276,6 +276,23 @@ TEST(Ipc, WhatAPeerSaidBeforeItVanishedStillArrivesAheadOfTheEnd)
     EXPECT_TRUE(call(*service.connect(), method("Count")));
 }
 
+TEST(Ipc, WhatAPeerSaidBeforeItVanishedIsReadWithinTheLimits)
+{
+    Service service({.callsInFlight = 2, .bytes = 300u << 10});
+    std::promise<void> gate;
+    service.beforeGiving = [open = gate.get_future().share()] { open.wait(); };
+    const auto note = [] { return Message{{std::string(30u << 10, 'x')}, {}}; }; // counts three times
+    auto client = service.connect();
+    client->call(probe().name, method("Give"), {{1}, {}}, {});
+    for (int i = 0; i < 5; ++i) client->call(probe().name, method("Note"), note(), {});
+    client.reset();
+    auto other = service.connect();
+    for (int i = 0; i < 3; ++i) EXPECT_TRUE(call(*other, method("Count")));
+    EXPECT_TRUE(call(*other, method("Note"), note())) << "there is room for it";
+    gate.set_value();
+    service.await([&] { return service.notes.size() == 7 && service.notes.back() == "<invalidated>"; });
+}
+
 TEST(Ipc, InvalidationWritesTheLastAnswerAndDeliversNothingMore)
 {
     Service service({.unreadBytes = 2 * kBeyondSocketBuffers});
