@@ -142,10 +142,10 @@ class Client:
         await self._connected()
 
     async def close(self) -> None:
-        """Ends the connection, and with it the session of its feedback. Further calls raise `DaemonAway`."""
+        """Ends the connection. Further calls raise `DaemonAway`."""
         self._closed = True
-        for connection in (self._connection, self._endpoint):
-            if connection:
+        async with self._connecting:
+            for connection in filter(None, (self._connection, self._endpoint)):
                 await connection.close()
         for listener in list(self._bag_listeners):
             listener(None)
@@ -273,6 +273,8 @@ class Client:
         self._bag_listeners.append(listener)
         if self._bag:
             listener(self._bag)
+        if self._closed:
+            listener(None)
 
         def end() -> None:
             if listener in self._bag_listeners:
@@ -322,6 +324,8 @@ class Client:
     async def _connected_endpoint(self) -> Connection:
         await self._connected()
         async with self._connecting:
+            if self._closed:
+                raise DaemonAway("the client is closed")
             if self._endpoint is None or self._endpoint.lost:
                 self._endpoint = await Connection.open(self._endpoint_address)
             return self._endpoint

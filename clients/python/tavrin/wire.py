@@ -116,7 +116,6 @@ class Connection:
                              '"systemctl --user start tavrind.socket", or run tavrind.') from problem
         connection = cls(reader, writer, on_signal)
         connection._receiver = asyncio.create_task(connection._receive())
-        await connection.call("org.freedesktop.DBus", "Hello", timeout=CONNECT_TIMEOUT)
         return connection
 
     async def close(self) -> None:
