@@ -6,6 +6,7 @@ const api = globalThis.browser ?? globalThis.chrome;
 const inXml = !api.runtime.getURL("").startsWith("moz-extension:");
 const host = new Host(api.runtime);
 let newest = 0; // number of the last input
+let leaving = 0; // timer
 let shown = { query: 0, rows: [] };
 
 /** Sets what the address field shows for the typed text itself, from the next key on. */
@@ -64,6 +65,7 @@ api.omnibox.onInputChanged.addListener(async (text, suggest) => {
 
 api.omnibox.onInputEntered.addListener(async (text, disposition) => {
   ++newest; // what is still searched for is no longer shown
+  clearTimeout(leaving);
   const row = shown.rows.find(({ content }) => content === text);
   if (row) host.tell({ do: "opened", query: shown.query, result: row.result, suggestion: row.suggestion });
   host.tell({ do: "ended", how: isWebAddress(text) ? "opened" : "searched" });
@@ -71,9 +73,11 @@ api.omnibox.onInputEntered.addListener(async (text, disposition) => {
   await (isWebAddress(text) ? open(text, disposition) : openSearch(text, disposition));
 });
 
+// Chromium also says that the input was cancelled just before it was entered.
 api.omnibox.onInputCancelled.addListener(() => {
   ++newest;
-  host.tell({ do: "ended", how: "cancelled" });
+  clearTimeout(leaving);
+  leaving = setTimeout(() => host.tell({ do: "ended", how: "cancelled" }), 500);
 });
 
 // The extension's page.
