@@ -18,6 +18,7 @@
 
 #include "platform/base/Uuid.h"
 #include "platform/base/WriteAll.h"
+#include "platform/run/WorkerPool.h"
 
 namespace platform {
 
@@ -81,6 +82,13 @@ FileInfo infoOf(const struct statx& status)
     info.created = status.stx_mask & STATX_BTIME ? dateOf(status.stx_btime) : info.modified;
     info.number = status.stx_ino;
     return info;
+}
+
+/// Calls fsync. Others run what this thread keeps meanwhile.
+int synchronized(int fd)
+{
+    WorkerPool::shareKeptJobs();
+    return fsync(fd);
 }
 
 /// Opens a directory for fsync, which makes renames in it durable.
@@ -158,9 +166,9 @@ public:
     {
         auto file = openForReading(source);
         if (!file) return std::unexpected(std::move(file.error()));
-        if (fchmod(file->fd(), 0600) != 0 || fsync(file->fd()) != 0) return failure(source);
+        if (fchmod(file->fd(), 0600) != 0 || synchronized(file->fd()) != 0) return failure(source);
         if (rename(source.c_str(), path.c_str()) == 0) {
-            if (const FileHandle directory = openDirectory(path.parent_path())) fsync(directory.fd());
+            if (const FileHandle directory = openDirectory(path.parent_path())) synchronized(directory.fd());
             return {}; // the source is gone
         }
         if (errno != EXDEV) return failure(path);
@@ -188,7 +196,7 @@ public:
         const auto file = openForReading(path);
         if (!file) return std::unexpected(file.error());
         const FileHandle directory = openDirectory(path.parent_path());
-        if (fsync(file->fd()) != 0 || !directory || fsync(directory.fd()) != 0) return failure(path);
+        if (synchronized(file->fd()) != 0 || !directory || synchronized(directory.fd()) != 0) return failure(path);
         return {};
     }
 
@@ -231,7 +239,7 @@ public:
     Result<void> syncDirectory(const fs::path& path) override
     {
         const FileHandle directory = openDirectory(path);
-        if (!directory || fsync(directory.fd()) != 0) return failure(path);
+        if (!directory || synchronized(directory.fd()) != 0) return failure(path);
         return {};
     }
 
@@ -307,7 +315,7 @@ private:
             [&] { return open(temporary.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600); }));
         if (!file) return failure(path);
         const FileHandle directory = sync == Sync::Yes ? openDirectory(path.parent_path()) : FileHandle();
-        const auto synced = [sync](const FileHandle& what) { return sync == Sync::No || fsync(what.fd()) == 0; };
+        const auto synced = [sync](const FileHandle& what) { return sync == Sync::No || synchronized(what.fd()) == 0; };
         if (fill(file.fd()) && synced(file) && (directory || sync == Sync::No) &&
             rename(temporary.c_str(), path.c_str()) == 0)
             return synced(directory) ? Result<void>() : failure(path.parent_path());

@@ -10,6 +10,7 @@
 #include <sqlite3.h>
 
 #include "platform/files/Files.h"
+#include "platform/run/WorkerPool.h"
 
 namespace platform {
 
@@ -128,6 +129,7 @@ Result<void> Sqlite::run(std::string_view statement, std::initializer_list<Param
                                         SQLITE_UTF8);
         if (bound != SQLITE_OK) return failure();
     }
+    WorkerPool::shareKeptJobs(); // the statement may wait for the disk, or for other users
     int stepped = SQLITE_ROW;
     while ((stepped = sqlite3_step(made)) == SQLITE_ROW)
         if (each) each(Row(made));

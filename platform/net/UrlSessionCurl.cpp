@@ -5,13 +5,13 @@
 #include <limits>
 #include <map>
 #include <mutex>
+#include <pthread.h>
 #include <thread>
 #include <vector>
 
 #include <curl/curl.h>
 
 #include "platform/base/Mutex.h"
-#include "platform/base/ThreadName.h"
 #include "platform/net/CurlLoad.h"
 #include "platform/net/HttpCache.h"
 #include "platform/net/UrlSession.h"
@@ -327,7 +327,7 @@ void Loader::run()
     constexpr int kQuiet = 2; // milliseconds
     bool isQuiet = false;
     bool mayBeUnread = false; // a transfer may have unprocessed data
-    setThreadNameForLabel("url-loader");
+    pthread_setname_np(pthread_self(), "url-loader");
     while (true) {
         {
             MutexLock lock(_mutex);

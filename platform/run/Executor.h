@@ -4,7 +4,8 @@
 
 namespace platform {
 
-/// Importance of work. Background work runs on a thread of lower CPU priority.
+/// Importance of work. Background work runs on a thread of lower CPU priority; high-priority work overtakes other work
+/// and should be short.
 enum class Priority { Background, Default, High };
 
 /// Runs jobs asynchronously, in unspecified order: a worker pool, a run loop, or a test that runs them by hand.

@@ -10,8 +10,8 @@
 #include <vector>
 
 #include "platform/base/Mutex.h"
-#include "platform/base/ThreadName.h"
 #include "platform/run/Clock.h"
+#include "platform/run/WorkerPool.h"
 
 namespace platform {
 
@@ -24,8 +24,16 @@ constexpr std::size_t kMaximumJobs = 64;
 
 /// The queues whose tasks this thread runs, innermost first.
 struct Frame {
-    explicit Frame(Queue* queue_) : queue(queue_), outer(top) { top = this; }
-    ~Frame() { top = outer; }
+    explicit Frame(Queue* queue_) : queue(queue_), outer(top)
+    {
+        top = this;
+        runningQueue = queue->label().c_str();
+    }
+    ~Frame()
+    {
+        top = outer;
+        runningQueue = outer ? outer->queue->label().c_str() : "";
+    }
     Queue* queue;
     Frame* outer;
     static thread_local Frame* top;
@@ -202,6 +210,14 @@ struct Queue::Core {
         end(entry.barrier);
     }
 
+    /// Called before the thread waits or goes on to another task.
+    void shareKeptJobs() REQUIRES(mutex)
+    {
+        mutex.unlock();
+        WorkerPool::shareKeptJobs();
+        mutex.lock();
+    }
+
     /// Returns when a caller of `sync` may run its task, which then counts as running.
     void awaitTurn(Queue& queue, bool barrier, Jobs& handedOver)
     {
@@ -210,6 +226,7 @@ struct Queue::Core {
         SyncWaiter self;
         entries.push_back({.waiter = &self, .barrier = barrier});
         ++waiters;
+        shareKeptJobs();
         while (!self.granted) {
             if (!headMayStart()) {
                 while (!self.granted && !self.mayDrain) self.wake.wait(mutex);
@@ -228,11 +245,13 @@ struct Queue::Core {
     /// A drain job, on a worker.
     void drain(Queue& queue)
     {
-        setThreadNameForLabel(place.label);
         Jobs handedOver(queue);
         MutexLock lock(mutex);
         --jobs;
-        for (unsigned i = 0; i < kBatch && headMayStart() && !entries.front().waiter; ++i) run(queue, take());
+        for (unsigned i = 0; i < kBatch && headMayStart() && !entries.front().waiter; ++i) {
+            run(queue, take());
+            if (headMayStart()) shareKeptJobs();
+        }
         pump(handedOver);
     }
 };

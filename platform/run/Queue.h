@@ -14,6 +14,10 @@ namespace platform {
 
 class Clock;
 
+/// The label of the innermost queue whose task this thread runs; empty if it runs none. For debuggers:
+/// `thread apply all print platform::runningQueue`.
+inline constinit thread_local const char* runningQueue = "";
+
 /// A condition that becomes true once, for which several queues may wait (`Queue::suspendUntil`). Any thread.
 class Event {
 public:
