@@ -182,7 +182,7 @@ void ClientState::warm()
 void ClientState::_markNetworkRequest()
 {
     const platform::Date now = _assembly.device.clock.wallNow();
-    _queue->async([self = shared_from_this(), now] { self->_lastNetworkRequest = now; });
+    _queue->sync([&] { _lastNetworkRequest = now; });
 }
 
 void ClientState::perform(const RequestKind& kind, std::shared_ptr<TAVRequest> request, RequestReply reply)

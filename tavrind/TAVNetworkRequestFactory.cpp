@@ -371,8 +371,8 @@ UrlRequest TAVNetworkRequestFactory::warmRequest(const Url& url)
 
 void TAVNetworkRequestFactory::setPerformedSearch()
 {
-    _contextAccessQueue->barrierAsync([self = shared_from_this()] {
-        if (self->_currentLocation) self->_context.lookupGeoLocationLatLng = self->_context.geoLocationLatLng;
+    _contextAccessQueue->barrierSync([this] {
+        if (_currentLocation) _context.lookupGeoLocationLatLng = _context.geoLocationLatLng;
     });
 }
 

@@ -56,8 +56,9 @@ std::optional<std::int32_t> sessionNumber(std::string_view fileName)
 }
 
 TavrinPersistentStorage::TavrinPersistentStorage(Assembly& assembly)
-    : _assembly(assembly), _queue(assembly.device.serialQueue("com.quorvane.tavrind.persistentStorageQueue",
-                                                              rank::kStore, platform::Priority::Background)),
+    // Of default priority: the reply to an event waits for the event to be written.
+    : _assembly(assembly),
+      _queue(assembly.device.serialQueue("com.quorvane.tavrind.persistentStorageQueue", rank::kStore)),
       _cachesUrl(assembly.device.directories.caches / "com.quorvane.tavrind"),
       _store(std::make_shared<FileContainerStore>(
           assembly.fileManager, assembly.device.transactions, assembly.diagnosticData, _queue,
@@ -127,10 +128,13 @@ void TavrinPersistentStorage::_settle()
 
 void TavrinPersistentStorage::_settleSoon()
 {
-    _queue->async([self = shared_from_this()] {
-        if (self->_unsettled.empty()) return;
-        self->_settle();
-        self->_settleSoon(); // a separate task lets waiting events be written in between
+    _assembly.device.globalQueue(platform::Priority::Background)->async([self = shared_from_this()] {
+        const bool settled = self->_queue->sync([&] {
+            if (self->_unsettled.empty()) return false;
+            self->_settle();
+            return true;
+        });
+        if (settled) self->_settleSoon(); // a separate task lets waiting events be written in between
     });
 }
 

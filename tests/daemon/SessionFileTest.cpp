@@ -304,15 +304,17 @@ TEST_F(SessionFileTest, FilesOfAnEarlierProcessAreCountedOneByOneAfterTheStart)
     device.files.files.clear(); // of the daemon's own sessions
     for (int i = 0; i < 3; ++i) closedFile({"a", "b"});
     std::vector<std::string> operations;
+    std::shared_ptr<FileContainer> written;
     device.files.fault = [&](std::string_view operation, const std::filesystem::path& path) {
-        if (path.filename().string().starts_with("session.") && operation != "info") operations.emplace_back(operation);
+        if (!path.filename().string().starts_with("session.") || operation == "info") return 0;
+        operations.emplace_back(operation);
+        if (operations.size() == 2) written->writeFeedback(feedback("x"), {}); // while the first file is read
         return 0;
     };
     const std::int64_t before = booked(FeedbackFate::Closed);
     const auto scanned = TavrinPersistentStorage::make(assembly());
     EXPECT_TRUE(operations.empty()) << "no file is read while the daemon starts";
-    const auto written = scanned->createFileContainerForWriting(FileUse::Session);
-    written->writeFeedback(feedback("x"), {});
+    written = scanned->createFileContainerForWriting(FileUse::Session);
     device.drain();
     EXPECT_EQ(operations, (std::vector<std::string>{"create", "read", "append", "read", "read"}));
     EXPECT_EQ(booked(FeedbackFate::Closed) - before, 6);
