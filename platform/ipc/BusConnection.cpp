@@ -17,7 +17,7 @@ namespace platform::ipc {
 
 namespace {
 
-/// Steps in one go, before other connections and the loop's jobs run. A message takes one or two.
+/// Steps in one go, before other connections have their turn. A message takes one or two.
 constexpr unsigned kStepsPerTurn = 64;
 
 /// Estimated bytes of sd-bus's own record of a message.
@@ -43,29 +43,7 @@ std::string_view describe(int result)
 
 } // namespace
 
-void BusContext::hold(pid_t process, std::size_t before, std::size_t now)
-{
-    held += now - before;
-    processes[process].bytes += now - before;
-    if (now >= before || !std::exchange(starved, false)) return;
-    for (const auto& connection : connections) connection->driveAgainLater();
-}
-
-bool BusContext::full(pid_t process)
-{
-    const bool isFull = held >= limits.bytes || processes[process].bytes >= limits.bytesPerProcess;
-    starved |= isFull;
-    return isFull;
-}
-
-bool BusContext::admits(pid_t process, std::size_t bytes)
-{
-    const bool admitted = held + bytes <= limits.bytes && processes[process].bytes + bytes <= limits.bytesPerProcess;
-    starved |= !admitted;
-    return admitted;
-}
-
-/// The owner's end: posts every operation to the loop.
+/// The owner's end: posts every operation to the lane.
 class BusConnection::Handle final : public Connection {
 public:
     explicit Handle(std::shared_ptr<BusConnection> core) : _core(std::move(core)) {}
@@ -87,22 +65,20 @@ public:
     }
     void resume() override
     {
-        onLoop([core = _core] { core->start(); });
+        _core->_lane->async([core = _core] { core->start(); });
     }
     void push(std::string_view signal, Message arguments) override
     {
-        onLoop(
+        _core->_lane->async(
             [core = _core, name = std::string(signal), message = std::move(arguments)] { core->push(name, message); });
     }
     void invalidate() override
     {
         _core->_silenced = true;
-        onLoop([core = _core] { core->invalidate(); });
+        _core->_lane->async([core = _core] { core->invalidate(); });
     }
 
 private:
-    void onLoop(Executor::Job job) { _core->_context->loop.execute(Priority::Default, std::move(job)); }
-
     const std::shared_ptr<BusConnection> _core;
 };
 
@@ -113,18 +89,21 @@ void BusConnection::BusUnref::operator()(sd_bus* bus) const
 
 std::shared_ptr<BusConnection> BusConnection::make(std::shared_ptr<BusContext> context,
                                                    std::shared_ptr<const Interface> interface, FileHandle socket,
-                                                   Peer peer, std::shared_ptr<Queue> queue,
-                                                   std::function<void()> closed)
+                                                   Peer peer, const std::string& label, std::function<void()> closed)
 {
-    std::shared_ptr<BusConnection> connection(new BusConnection(
-        std::move(context), std::move(interface), std::move(socket), peer, std::move(queue), std::move(closed)));
-    connection->_context->connections.insert(connection);
+    std::shared_ptr<BusConnection> connection(
+        new BusConnection(std::move(context), std::move(interface), std::move(socket), peer, label, std::move(closed)));
+    connection->_context->insert(connection);
     return connection;
 }
 
 BusConnection::BusConnection(std::shared_ptr<BusContext> context, std::shared_ptr<const Interface> interface,
-                             FileHandle socket, Peer peer, std::shared_ptr<Queue> queue, std::function<void()> closed)
-    : _context(std::move(context)), _interface(std::move(interface)), _peer(peer), _queue(std::move(queue)),
+                             FileHandle socket, Peer peer, const std::string& label, std::function<void()> closed)
+    : _context(std::move(context)), _interface(std::move(interface)), _peer(peer),
+      _queue(Queue::make(label, Queue::Kind::Serial, _context->pool, _context->clock, Rank::Root)),
+      // Of high priority: a reply is written before the work that its call left behind.
+      _lane(Queue::make(label + ".transport", Queue::Kind::Serial, _context->pool, _context->clock, Rank::Root,
+                        Priority::High)),
       _closed(std::move(closed)), _socket(std::move(socket))
 {}
 
@@ -170,11 +149,11 @@ void BusConnection::start()
     if (result < 0) return end(describe(result));
 
     startTimer();
-    _watchedEvents = EPOLLIN;
-    _watch = _context->loop.watch(_fd, _watchedEvents, [weak = weak_from_this()](std::uint32_t events) {
+    _source = _context->pool.watch(_fd, _lane, [weak = weak_from_this()](std::uint32_t events) {
         if (auto self = weak.lock()) self->ready(events);
     });
     drive(true);
+    updateEvents();
 }
 
 void BusConnection::push(std::string_view signal, const Message& arguments)
@@ -193,7 +172,7 @@ void BusConnection::push(std::string_view signal, const Message& arguments)
     auto size = encodeArguments(message, member->in, arguments);
     if (!size) return pushFailed(fmt::format("{} can't be sent: {}", signal, size.error()));
     send(message, *size);
-    updateWatch();
+    updateEvents();
 }
 
 void BusConnection::pushFailed(const std::string& reason) const
@@ -210,7 +189,7 @@ void BusConnection::invalidate()
     dropCalls();
     if (_unwritten.empty()) return close();
     startTimer();
-    updateWatch();
+    updateEvents();
 }
 
 // MARK: - reading
@@ -231,6 +210,7 @@ void BusConnection::ready(std::uint32_t events)
         if (_state == State::Draining) return close();
         _peerGone = true;
     }
+    _input->wake(_peerGone);
     drive((events & EPOLLOUT) != 0);
 }
 
@@ -261,7 +241,7 @@ void BusConnection::drive(bool writable)
             cancelTimer();
         }
     }
-    driveAgainLater();
+    driveAgain();
 }
 
 /// Passes more of the peer's input to sd-bus. Returns false if nothing can be passed now, or if the connection ended.
@@ -287,7 +267,7 @@ bool BusConnection::announceMessage()
     if (paused()) {
         if (_state == State::Open) cancelTimer();
         if (_peerGone) catchUp();
-        updateWatch();
+        updateEvents();
         return false;
     }
     switch (_input->look()) {
@@ -302,13 +282,16 @@ bool BusConnection::announceMessage()
         return false;
     }
     const std::size_t cost = size * (1 + kDecodedShare);
-    if (size > kSmallMessage && !_context->admits(_peer.pid, cost)) {
+    if (size <= kSmallMessage) {
+        hold(_receiving, cost);
+    } else if (_context->reserve(_peer.pid, cost)) {
+        _receiving = cost;
+    } else {
         _heldBack = true;
         if (_peerGone) catchUp();
-        updateWatch();
+        updateEvents();
         return false;
     }
-    hold(_receiving, cost);
     return true;
 }
 
@@ -318,10 +301,10 @@ void BusConnection::catchUp()
 {
     if (_calls.empty() || std::exchange(_catchingUp, true)) return;
     _queue->async([self = shared_from_this()] {
-        self->_context->loop.execute(Priority::Default, [self] {
+        self->_lane->async([self] {
             self->_catchingUp = false;
             self->dropCalls();
-            self->driveAgainLater();
+            self->drive(false);
         });
     });
 }
@@ -329,7 +312,7 @@ void BusConnection::catchUp()
 void BusConnection::waitForMore()
 {
     if (_authenticated && _state == State::Open && _input->begun() && _timer == 0) startTimer();
-    updateWatch();
+    updateEvents();
 }
 
 void BusConnection::hold(std::size_t& part, std::size_t bytes)
@@ -338,10 +321,10 @@ void BusConnection::hold(std::size_t& part, std::size_t bytes)
     part = bytes;
 }
 
-void BusConnection::driveAgainLater()
+void BusConnection::driveAgain()
 {
-    if (std::exchange(_driveQueued, true)) return;
-    _context->loop.execute(Priority::Default, [self = shared_from_this()] {
+    if (_driveQueued.exchange(true)) return;
+    _lane->async([self = shared_from_this()] {
         self->_driveQueued = false;
         if (self->_state == State::Open || self->_state == State::Draining) self->drive(false);
     });
@@ -427,14 +410,12 @@ void BusConnection::callHandler(const Handler& handler, std::string_view member,
         [self = shared_from_this(), id](CallResult result) {
             const std::size_t size = result ? memoryOf(*result) : result.error().message.size();
             self->_context->backlog.add(size);
-            self->_context->loop.execute(Priority::Default, [self, id, size, result = std::move(result)]() mutable {
+            self->_lane->async([self, id, size, result = std::move(result)]() mutable {
                 self->answer(id, std::move(result), size);
                 self->_context->backlog.remove(size);
             });
         },
-        [self = shared_from_this(), id] {
-            self->_context->loop.execute(Priority::Default, [self, id] { self->forget(id); });
-        });
+        [self = shared_from_this(), id] { self->_lane->async([self, id] { self->forget(id); }); });
     handler(member, std::move(arguments), std::move(responder));
 }
 
@@ -459,7 +440,7 @@ void BusConnection::forget(std::uint64_t id)
     if (wasPaused && !paused())
         drive(false);
     else
-        updateWatch();
+        updateEvents();
 }
 
 void BusConnection::dropCalls()
@@ -494,18 +475,7 @@ void BusConnection::send(sd_bus_message* message, std::size_t size)
         return;
     }
     settleWriteQueue(size + kMessageOverhead);
-    if (_unwritten.size() > 1 && _unwrittenBytes > _context->limits.queuedBytes) return end("it doesn't read");
-    relieve();
-}
-
-/// Ends the connection with the most unread bytes until all together are within the limit.
-void BusConnection::relieve()
-{
-    while (_context->unread > _context->limits.unreadBytes) {
-        const auto worst = *std::ranges::max_element(
-            _context->connections, {}, [](const auto& connection) { return connection->_unwrittenBytes; });
-        worst->end("it doesn't read, and memory is short");
-    }
+    if (_unwritten.size() > 1 && _unwrittenBytes > _context->limits.queuedBytes) end("it doesn't read");
 }
 
 /// Updates the count of unwritten bytes from sd-bus's write queue. Each new message there counts as `sizeOfNewest`.
@@ -522,31 +492,35 @@ void BusConnection::settleWriteQueue(std::size_t sizeOfNewest)
 void BusConnection::setUnwritten(std::size_t bytes)
 {
     if (bytes == _unwrittenBytes) return;
-    _context->unread += bytes - _unwrittenBytes;
+    _context->setUnread(*this, bytes);
     hold(_unwrittenBytes, bytes);
 }
 
 bool BusConnection::peerHasGone()
 {
     pollfd state{_fd, 0, 0};
-    if (!_peerGone && poll(&state, 1, 0) > 0 && (state.revents & (POLLHUP | POLLERR)) != 0) _peerGone = true;
+    if (!_peerGone && poll(&state, 1, 0) > 0 && (state.revents & (POLLHUP | POLLERR)) != 0) {
+        _peerGone = true;
+        _input->wake(true);
+        driveAgain();
+    }
     return _peerGone;
 }
 
-void BusConnection::updateWatch()
+void BusConnection::updateEvents()
 {
-    if (!_watch || _state == State::Closed) return;
+    if (!_source || _state == State::Closed) return;
     const int wanted = sd_bus_get_events(_bus.get());
-    if (wanted < 0) return driveAgainLater();
+    if (wanted < 0) return driveAgain();
     // Reports a disconnect even while reading is paused.
-    std::uint32_t events = static_cast<std::uint32_t>(wanted) | EPOLLHUP;
+    std::uint32_t events = static_cast<std::uint32_t>(wanted) | EPOLLHUP | EPOLLET;
     const bool reads = !_authenticated || !_input->betweenMessages() || !paused();
     if (reads)
         events |= EPOLLIN;
     else
         events &= ~static_cast<std::uint32_t>(EPOLLIN);
     if (_peerGone && !reads) events = 0; // the disconnect is known
-    if (events != std::exchange(_watchedEvents, events)) _watch->setEvents(events);
+    if (events != std::exchange(_watchedEvents, events)) _source->setEvents(events);
 }
 
 // MARK: - ending
@@ -554,11 +528,11 @@ void BusConnection::updateWatch()
 void BusConnection::startTimer()
 {
     cancelTimer();
-    RunLoop& loop = _context->loop;
-    _timer = _context->clock.after(_context->limits.patience, [weak = weak_from_this(), &loop] {
-        loop.execute(Priority::Default, [weak] {
-            auto self = weak.lock();
-            if (!self || std::exchange(self->_timer, 0) == 0) return;
+    _timer = _context->clock.after(_context->limits.patience, [weak = weak_from_this(), number = ++_lastTimer] {
+        const auto connection = weak.lock();
+        if (!connection) return;
+        connection->_lane->async([self = connection, number] {
+            if (number != self->_lastTimer || std::exchange(self->_timer, 0) == 0) return; // cancelled meanwhile
             self->end("it took too long");
         });
     });
@@ -591,25 +565,29 @@ void BusConnection::close()
     dropCalls();
     hold(_receiving, 0);
     setUnwritten(0);
-    if (_watch) _watch->setEvents(0);
-    // Posted: sd-bus's objects and the watch must not be destroyed inside their own callbacks.
-    _context->loop.execute(Priority::Default, [self = shared_from_this()] { self->dispose(); });
+    _source.reset();
+    // Posted: sd-bus's objects must not be destroyed inside their own callbacks.
+    _lane->async([self = shared_from_this()] { self->dispose(); });
 }
 
 void BusConnection::dispose()
 {
-    _watch.reset();
     _bus.reset();
     _input.reset();
     _socket = FileHandle();
-    _context->connections.erase(shared_from_this());
+    _context->release(_peer.pid);
+    _context->erase(*this);
     if (_closed) std::exchange(_closed, {})();
 }
 
 void BusConnection::abandon()
 {
-    close();
-    dispose();
+    _lane->async([self = shared_from_this()] { self->close(); });
+}
+
+void BusConnection::drop()
+{
+    _lane->async([self = shared_from_this()] { self->end("it doesn't read, and memory is short"); });
 }
 
 } // namespace platform::ipc

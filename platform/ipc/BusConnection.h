@@ -3,76 +3,51 @@
 #include <atomic>
 #include <deque>
 #include <functional>
-#include <map>
 #include <memory>
 #include <optional>
-#include <set>
 #include <string>
 #include <unordered_map>
 
+#include "platform/ipc/BusContext.h"
 #include "platform/ipc/BusInput.h"
 #include "platform/ipc/BusMessage.h"
 #include "platform/ipc/Ipc.h"
-#include "platform/ipc/ReplyBacklog.h"
 #include "platform/run/Clock.h"
-#include "platform/run/RunLoop.h"
+#include "platform/run/WorkerPool.h"
 
 struct sd_bus;
 
 namespace platform::ipc {
 
-class BusConnection;
-
-/// The state that the parts of one transport share, and the count of bytes that peers make it hold (`Limits`). Loop's
-/// thread.
-struct BusContext {
-    struct Process {
-        unsigned connections = 0;
-        std::size_t bytes = 0;
-        bool refused = false; ///< a connection was refused since the last one closed
-    };
-
-    /// Counts a change: a part of the bytes of `process` was `before` bytes and is `now` bytes.
-    void hold(pid_t process, std::size_t before, std::size_t now);
-    /// Returns true if `process`, or all together, reached a limit: its further calls must wait.
-    [[nodiscard]] bool full(pid_t process);
-    /// Returns true if `bytes` more of `process` fit. After false, all connections are driven again once bytes are
-    /// freed.
-    [[nodiscard]] bool admits(pid_t process, std::size_t bytes);
-
-    RunLoop& loop;
-    Executor& executor;
-    Clock& clock;
-    const Limits limits;
-    std::set<std::shared_ptr<BusConnection>> connections{}; ///< those not closed yet
-    std::map<pid_t, Process> processes{};                   ///< those with connections
-    std::size_t held = 0;                                   ///< bytes of all processes
-    std::size_t unread = 0;                                 ///< the part of `held` that peers have not read
-    bool starved = false;                                   ///< a connection waits for bytes to be freed
-    ReplyBacklog backlog{limits.unsentBytes};               ///< any thread
-};
-
-/// The loop's side of one server connection: an sd-bus object, its pending calls and its unwritten output.
+/// One server connection: an sd-bus object, its pending calls and its unwritten output.
 ///
 ///     call: socket → BusInput (limits) → sd-bus → onMessage (decode) → queue: handler
-///     answer: any thread → loop: answer (encode) → sd-bus → [its write queue] → socket
+///     answer: any thread → lane: answer (encode) → sd-bus → [its write queue] → socket
+///
+/// A serial queue of its own, the lane, guards the sd-bus object and everything else here. The socket is a source on
+/// it, so that the worker that a call wakes also runs the handler and writes the reply, while both queues are idle. The
+/// lane goes on while the connection's queue is suspended.
 ///
 /// States: Waiting until `start`; Open; Draining after `invalidate` until queued output is written; Closed. The context
-/// owns the connection until Closed. Loop's thread, except for `handle` and `callHandler`.
+/// owns the connection until Closed. Confined to the lane, except for `make`, `handle`, `abandon`, `driveAgain`,
+/// `drop` and `callHandler`.
 class BusConnection final : public std::enable_shared_from_this<BusConnection> {
 public:
-    /// Takes ownership of a connected socket. `closed` runs once, on the loop.
+    /// Takes ownership of a connected socket. `label` becomes the label of the connection's queue. `closed` runs once,
+    /// on the lane.
     static std::shared_ptr<BusConnection> make(std::shared_ptr<BusContext> context,
                                                std::shared_ptr<const Interface> interface, FileHandle socket, Peer peer,
-                                               std::shared_ptr<Queue> queue, std::function<void()> closed);
+                                               const std::string& label, std::function<void()> closed);
     ~BusConnection();
 
     /// Returns the connection for its acceptor; releasing it ends the connection. Call it once.
     [[nodiscard]] std::shared_ptr<Connection> handle();
-    /// Closes at once and drops unwritten output; for the destructor of the transport.
+    /// Closes soon and drops unwritten output; for the destructor of the transport.
     void abandon();
-    /// Posts another `drive`, which reads input that was held back.
-    void driveAgainLater();
+    /// Reads input that was held back, soon.
+    void driveAgain();
+    /// Ends the connection soon, because all connections together have too many unread bytes.
+    void drop();
 
 private:
     class Handle;
@@ -88,9 +63,9 @@ private:
     };
 
     BusConnection(std::shared_ptr<BusContext> context, std::shared_ptr<const Interface> interface, FileHandle socket,
-                  Peer peer, std::shared_ptr<Queue> queue, std::function<void()> closed);
+                  Peer peer, const std::string& label, std::function<void()> closed);
 
-    // the owner's operations, each of them a job on the loop
+    // the owner's operations
     void start();
     void push(std::string_view signal, const Message& arguments);
     void pushFailed(const std::string& reason) const;
@@ -118,9 +93,8 @@ private:
     void send(sd_bus_message* message, std::size_t size);
     void settleWriteQueue(std::size_t sizeOfNewest);
     void setUnwritten(std::size_t bytes);
-    void relieve();
     [[nodiscard]] bool peerHasGone();
-    void updateWatch();
+    void updateEvents();
 
     // ending
     void end(std::string_view reason);
@@ -134,6 +108,7 @@ private:
     const std::shared_ptr<const Interface> _interface;
     const Peer _peer;
     const std::shared_ptr<Queue> _queue;
+    const std::shared_ptr<Queue> _lane;
     std::function<void()> _closed;
 
     // Set by the owner before `start`.
@@ -147,16 +122,17 @@ private:
     int _fd = -1;                   // the peer's socket, which sd-bus writes to and owns
     std::optional<BusInput> _input; // from `start`
     std::unique_ptr<sd_bus, BusUnref> _bus;
-    std::unique_ptr<RunLoop::Watch> _watch;
+    std::unique_ptr<WorkerPool::Source> _source;
     std::uint32_t _watchedEvents = 0;
     bool _peerGone = false;
     bool _catchingUp = false;
-    bool _driveQueued = false;
+    std::atomic<bool> _driveQueued = false;
     bool _authenticated = false;
     bool _fed = false;        // sd-bus may have unread input
     bool _messageDue = false; // sd-bus has part of a message and has not delivered it
     bool _heldBack = false;   // the next message waits until bytes are freed
     Clock::TimerId _timer = 0;
+    std::uint64_t _lastTimer = 0; // number of the timer that was started last
 
     std::unordered_map<std::uint64_t, PendingCall> _calls;
     std::uint64_t _lastCall = 0;

@@ -40,14 +40,13 @@ std::optional<std::uint64_t> messageSize(std::span<const char, kFixedHeader> hea
 
 BusInput::Outcome BusInput::fill()
 {
-    // The socket was empty: its next event reports more input.
-    if (std::exchange(_drained, false)) return Outcome::Empty;
+    if (_drained) return Outcome::Empty; // saves a read
     std::array<char, kReadAhead> bytes;
     const std::size_t room = bytes.size() - _buffer.size();
     const ssize_t got = recv(_socket, bytes.data(), room, 0);
     if (got > 0) {
         _buffer.append(bytes.data(), static_cast<std::size_t>(got));
-        _drained = static_cast<std::size_t>(got) < room;
+        _drained = !_isLast && static_cast<std::size_t>(got) < room;
     }
     return outcomeOf(got);
 }

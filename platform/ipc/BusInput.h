@@ -21,7 +21,7 @@ namespace platform::ipc {
 ///     socket → fill → _buffer (at most `kReadAhead`) → pair → sd-bus
 ///     socket → pair, for the rest of a larger message
 ///
-/// Owned by its connection and confined to the connection's thread.
+/// Owned by its connection and confined to the connection's lane.
 class BusInput {
 public:
     enum class Outcome {
@@ -38,6 +38,12 @@ public:
     /// non-blocking.
     BusInput(int socket, FileHandle pair) : _socket(socket), _pair(std::move(pair)) {}
 
+    /// Call this for each event of the socket; `isLast` if the peer has gone, so that no event follows.
+    void wake(bool isLast)
+    {
+        _drained = false;
+        _isLast = isLast;
+    }
     /// Passes one line of the authentication.
     [[nodiscard]] Outcome passLine();
     /// Reads the header of the next message; call it between messages only. After Passed, `announced` is the size.
@@ -61,7 +67,8 @@ private:
     std::string _buffer;
     std::size_t _announced = 0;
     std::size_t _left = 0; // bytes of the current message that are not passed yet
-    bool _drained = false; // the last read returned less than asked for: the socket is empty
+    bool _drained = false; // the last read returned less than asked for: the socket is empty until `wake`
+    bool _isLast = false;  // the socket must be read to its end
 };
 
 /// Bytes of the fixed part of a D-Bus message header.

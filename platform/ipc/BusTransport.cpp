@@ -8,8 +8,11 @@
 #include <unistd.h>
 
 #include "platform/ipc/BusConnection.h"
+#include "platform/ipc/BusContext.h"
 #include "platform/ipc/IpcLog.h"
 #include "platform/ipc/ListenSocket.h"
+#include "platform/run/Clock.h"
+#include "platform/run/RunLoop.h"
 
 namespace platform::ipc {
 
@@ -90,26 +93,24 @@ private:
             return;
         }
         const pid_t pid = credentials->pid;
-        const auto process = _context->processes.try_emplace(pid).first;
-        if (process->second.connections >= _context->limits.connectionsPerProcess) {
-            if (!std::exchange(process->second.refused, true)) // logs once, however often the process tries
-                kLog.error("{}: refused process {}: it has {} connections", _label, pid, process->second.connections);
+        switch (_context->admit(pid)) {
+        case BusContext::Admission::Admitted: break;
+        case BusContext::Admission::Refused: // logs once, however often the process tries
+            kLog.error("{}: refused process {}: it has {} connections", _label, pid,
+                       _context->limits.connectionsPerProcess);
             return;
+        case BusContext::Admission::RefusedAgain: return;
         }
-        ++process->second.connections;
         ++_open;
-        auto queue = Queue::make(_label, Queue::Kind::Serial, _context->executor, _context->clock, Rank::Root);
-        auto connection =
-            BusConnection::make(_context, _interface, std::move(socket), Peer{pid, credentials->uid}, std::move(queue),
-                                [weak = weak_from_this(), context = _context.get(), pid] {
-                                    const auto counted = context->processes.find(pid);
-                                    counted->second.refused = false;
-                                    if (--counted->second.connections == 0) context->processes.erase(counted);
-                                    auto self = weak.lock();
-                                    if (!self) return;
-                                    --self->_open;
-                                    self->pause(false);
-                                });
+        auto connection = BusConnection::make(_context, _interface, std::move(socket), Peer{pid, credentials->uid},
+                                              _label, [weak = weak_from_this(), &loop = _context->loop] {
+                                                  loop.execute(Priority::Default, [weak] {
+                                                      auto self = weak.lock();
+                                                      if (!self) return;
+                                                      --self->_open;
+                                                      self->pause(false);
+                                                  });
+                                              });
         _acceptor(connection->handle());
     }
 
@@ -173,16 +174,15 @@ public:
 
 class BusTransport final : public Transport {
 public:
-    BusTransport(RunLoop& loop, Executor& executor, Clock& clock, std::filesystem::path directory, Limits limits)
-        : _context(std::make_shared<BusContext>(loop, executor, clock, limits)), _directory(std::move(directory))
+    BusTransport(RunLoop& loop, WorkerPool& pool, Clock& clock, std::filesystem::path directory, const Limits& limits)
+        : _context(std::make_shared<BusContext>(loop, pool, clock, limits)), _directory(std::move(directory))
     {
         sweepDeadSockets(_directory, kEndpointPrefix);
     }
 
     ~BusTransport() override
     {
-        const auto connections = _context->connections;
-        for (const auto& connection : connections) connection->abandon();
+        for (const auto& connection : _context->takeConnections()) connection->abandon();
     }
 
     Result<std::unique_ptr<Listener>> listen(const Interface& interface, const std::string& label) override
@@ -216,10 +216,10 @@ private:
 
 } // namespace
 
-std::unique_ptr<Transport> makeBusTransport(RunLoop& runLoop, Executor& executor, Clock& clock,
+std::unique_ptr<Transport> makeBusTransport(RunLoop& runLoop, WorkerPool& pool, Clock& clock,
                                             std::filesystem::path directory, Limits limits)
 {
-    return std::make_unique<BusTransport>(runLoop, executor, clock, std::move(directory), limits);
+    return std::make_unique<BusTransport>(runLoop, pool, clock, std::move(directory), limits);
 }
 
 } // namespace platform::ipc

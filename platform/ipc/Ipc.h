@@ -24,9 +24,9 @@ class RecordClasses;
 /// Local IPC: the D-Bus protocol, peer to peer over Unix sockets, implemented with sd-bus.
 ///
 /// A server is a `Listener` that accepts `Connection`s. Each connection exports one object, which handles method calls,
-/// and can push signals to its peer. Calls run on the connection's serial queue. sd-bus messages stay on the run loop's
-/// thread; no other room sees them. A service can send file handles but accepts none: a call that carries one ends its
-/// connection.
+/// and can push signals to its peer. Calls run on the connection's serial queue. sd-bus messages stay on another queue
+/// of the connection; no other room sees them. A service can send file handles but accepts none: a call that carries
+/// one ends its connection.
 namespace platform::ipc {
 
 /// The arguments of a call, a reply or a signal.

@@ -10,8 +10,8 @@
 
 namespace platform::ipc {
 
-/// Counts the replies that handlers gave and that the loop's thread has not encoded yet, and delays further handlers
-/// beyond a limit: workers can make large replies faster than one thread encodes them. Any thread.
+/// Counts the replies that handlers gave and that are not encoded yet, and delays further handlers beyond a limit:
+/// handlers can make large replies faster than they are encoded. Any thread.
 class ReplyBacklog {
 public:
     /// Handlers wait while the backlog has at least `limit` bytes.

@@ -429,6 +429,7 @@ TEST(Ipc, EndpointsAreApartFromEachOtherAndGoWithTheirListener)
     client->onSignal([&](auto interface, auto member, const Message& message) {
         told = std::string(interface) + "." + std::string(member) + toJson(message.args);
     });
+    service.await([&] { return service.connections.size() == 1; });
     EXPECT_EQ(service.connections.at(0)->queue()->label(), "com.example.endpoint");
     EXPECT_EQ(service.connections.at(0)->peer().pid, getpid());
     service.connections[0]->push("Told", {{"news", Dictionary{{"n", 1}}}, {}});
@@ -514,6 +515,7 @@ TEST(Ipc, EveryMessageHasASenderTheServiceCountsAsRunningAndIsIntrospected)
         EXPECT_THAT(text, HasSubstr(std::string("name=\"") + contents));
     }
 
+    service.await([&] { return service.connections.size() == 1; });
     service.connections.at(0)->push("Told", {{"news", Dictionary()}, {}});
     sd_bus_message* told = nullptr;
     while (!told && sd_bus_wait(foreign.bus, 60'000'000) > 0)

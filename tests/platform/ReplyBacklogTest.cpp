@@ -58,19 +58,22 @@ TEST(ReplyBacklog, NoHandlerIsCalledWhileLargeRepliesAreUnsent)
 {
     Service service({.unsentBytes = 1000});
     auto client = service.connect();
-    // The loop is busy from the reply to the first call, until neither worker is with the second one.
-    service.beforeGiving = [&] {
-        service.loop.execute(Priority::Default, [&] {
-            const auto workers = std::make_shared<std::latch>(3);
-            for (int i = 0; i < 2; ++i)
-                service.pool.execute(Priority::Default, [workers] { workers->arrive_and_wait(); });
-            workers->arrive_and_wait();
-            std::lock_guard lock(service.mutex);
-            EXPECT_THAT(service.notes, IsEmpty());
-        });
-    };
+    service.await([&] { return service.connections.size() == 1; });
+    const auto connection = service.connections[0];
+    // A push that fails holds the lane: the first until both calls can be read, the second from the reply to the first
+    // call until no other worker is with the second one.
     std::promise<void> written;
-    service.loop.execute(Priority::Default, [&, both = written.get_future().share()] { both.wait(); });
+    service.onPushError = [&, calls = 0]() mutable {
+        if (calls++ == 0) return written.get_future().wait();
+        const auto idle = std::make_shared<std::latch>(1);
+        service.pool.execute(Priority::Default, [idle] { idle->count_down(); });
+        WorkerPool::shareKeptJobs();
+        idle->wait();
+        std::lock_guard lock(service.mutex);
+        EXPECT_THAT(service.notes, IsEmpty());
+    };
+    service.beforeGiving = [&] { connection->push("Unknown", {}); };
+    connection->push("Unknown", {});
     int answered = 0;
     const auto count = [&](const CallResult& result) { answered += result.has_value(); };
     client->call(probe().name, method("Give"), {{1000}, {}}, count);

@@ -25,6 +25,7 @@
 #include "platform/values/Dictionary.h"
 #include "tests/support/ManualClock.h"
 #include "tests/support/TemporaryDirectory.h"
+#include "tests/support/Workers.h"
 
 namespace platform::ipc::test {
 
@@ -81,6 +82,8 @@ public:
         for (Responder& reply : held) reply.abandon();
         connections.clear();
         listener.reset();
+        transport.reset();
+        platform::test::settle(pool, kWorkers);
     }
 
     std::string directory() const { return (_directory / "service").string(); }
@@ -96,6 +99,9 @@ public:
                         reply.abandon();
                 });
             connection->setInvalidationHandler([this] { note("<invalidated>"); });
+            connection->setPushErrorHandler([this](const std::string&) {
+                if (onPushError) onPushError();
+            });
             connection->resume();
             std::lock_guard lock(mutex);
             connections.push_back(connection);
@@ -110,12 +116,13 @@ public:
         std::unique_lock lock(mutex);
         ASSERT_TRUE(changed.wait_for(lock, kLong, holds));
     }
-    /// Waits until the loop has run what it was given so far.
+    /// Waits until the loop and the workers have run what they were given so far.
     void settle()
     {
         std::promise<void> done;
         loop.execute(Priority::Default, [&] { done.set_value(); });
         done.get_future().wait();
+        platform::test::settle(pool, kWorkers);
     }
     void pass(Duration time)
     {
@@ -136,11 +143,14 @@ public:
     std::vector<Responder> held;
     std::size_t mostHeld = 0;
     std::function<void()> beforeGiving;
-    WorkerPool pool{2};
+    std::function<void()> onPushError;
+    WorkerPool pool{kWorkers};
     std::unique_ptr<Transport> transport;
     std::unique_ptr<Listener> listener;
 
 private:
+    static constexpr unsigned kWorkers = 2;
+
     void note(std::string text)
     {
         std::lock_guard lock(mutex);

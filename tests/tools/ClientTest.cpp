@@ -22,6 +22,7 @@
 #include "searchrecords/ZRViewFeedback.h"
 #include "tests/support/ManualClock.h"
 #include "tests/support/TemporaryDirectory.h"
+#include "tests/support/Workers.h"
 #include "tools/tavrinctl/FeedbackRecords.h"
 
 namespace tavrin::test {
@@ -128,6 +129,7 @@ struct ClientTest : testing::Test {
         listener.reset();
         endpoint.reset();
         transport.reset();
+        platform::test::settle(pool, 2);
     }
 
     TAVSearchRequest search(std::string query, std::int64_t queryId)
