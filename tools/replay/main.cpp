@@ -100,6 +100,8 @@ private:
         for (Search& earlier : _underWay) earlier.overtaken = true;
         auto request = TAVSearchRequest::searchRequestWithString(text, StartSearchTrigger::NewCharacter);
         request->queryId = ++_lastQueryId;
+        request->scale = 1;
+        request->keyboardInputMode = "en";
         request->verboseReply = true; // shows if the cache or the service answered
         const auto search = _underWay.insert(_underWay.end(), {.queryId = _lastQueryId, .text = text});
         search->tooShort = !_bag->isEnabled() || platform::utf16Length(text) < _bag->minimumQueryLength();
