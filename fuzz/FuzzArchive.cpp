@@ -2,10 +2,11 @@
 #include "platform/values/Archive.h"
 
 /// An archive of any record, as a session file holds it. What decodes can be encoded again, to an equal record; and so
-/// it is for the archive read as plain values.
+/// it is for the archive read as plain values, and in place.
 void runInput(std::string_view input)
 {
     const auto record = platform::unarchive(input, tavrin::tavrindRecordClasses());
+    fuzz::checkInPlace(input, record.value_or(nullptr));
     if (record) {
         fuzz::checkRoundTrips(**record);
         fuzz::checkUpload(*record);

@@ -2,8 +2,10 @@
 
 #include "fuzz/Check.h"
 #include "platform/values/Archive.h"
+#include "platform/values/ArchivedRecord.h"
 #include "platform/values/Dictionary.h"
 #include "platform/values/Json.h"
+#include "platform/values/JsonSink.h"
 #include "platform/values/Record.h"
 #include "platform/values/ValueCoder.h"
 #include "tavrind/SessionProcessingHelper.h"
@@ -11,6 +13,8 @@
 #include "tests/support/BusMessages.h"
 
 namespace fuzz {
+
+using platform::operator""_field;
 
 /// Checks that a record from outside comes back whole from both of its encodings. Archives are compared, not values:
 /// they hold every field, and a number that is none equals itself there.
@@ -41,6 +45,23 @@ inline void checkBus(const platform::Value& dictionary, const std::shared_ptr<pl
     check(difference.empty(), difference);
 }
 
+/// The JSON of an event, read in place; empty for another record. Nothing if it is not as `archive` writes it.
+inline std::optional<std::string> uploadOf(std::string_view archive)
+{
+    platform::OpenArchive open(tavrin::tavrindRecordClasses());
+    if (!open.open(archive)) return std::nullopt;
+    const auto event = open.root().as<tavrin::TavrinFeedback>();
+    if (!event) return "";
+    platform::JsonTextSink json;
+    tavrin::TavrinFeedback::write(json, event, event["timestamp"_field]);
+    tavrin::SessionProcessingHelper helper;
+    tavrin::TavrinFeedback::process(event, helper);
+    platform::JsonTextSink replaced;
+    tavrin::TavrinFeedback::write(replaced, event, 0, &helper);
+    check(!replaced.text().empty(), "no JSON");
+    return json.text();
+}
+
 /// Checks that a record of an event can be uploaded.
 inline void checkUpload(const std::shared_ptr<platform::Record>& record)
 {
@@ -49,11 +70,20 @@ inline void checkUpload(const std::shared_ptr<platform::Record>& record)
         event = std::make_shared<tavrin::TavrinFeedback>(std::move(feedback), 1, "", "");
     if (!event) return;
     check(!event->description().empty(), "no description");
-    tavrin::SessionProcessingHelper helper;
-    event->process(helper);
-    const platform::Dictionary uploaded = event->dictionary();
-    check(uploaded.contains("type") && uploaded.contains("timestamp"), "event without its keys");
-    check(!platform::toJson(uploaded).empty(), "no JSON");
+    const std::string bytes = platform::archive(*event);
+    if (!platform::unarchive(bytes, tavrin::tavrindRecordClasses())) return; // nested too deep
+    const platform::Value uploaded = event->dictionary();
+    check(uploaded["type"].asString() && uploaded["timestamp"].asUInt(), "event without its keys");
+    check(uploadOf(bytes) == platform::toJson(uploaded), platform::toJson(uploaded));
+}
+
+/// Checks that an archive that is read in place is one that can be read, and makes the same event as its record.
+inline void checkInPlace(std::string_view archive, const std::shared_ptr<platform::Record>& record)
+{
+    const auto text = uploadOf(archive);
+    if (!text) return;
+    check(record != nullptr, *text);
+    check(text == uploadOf(platform::archive(*record)), *text);
 }
 
 /// Checks that a refusal says why.

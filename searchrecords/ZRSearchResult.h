@@ -28,9 +28,6 @@ struct ZRPunchout : platform::RecordOf<ZRPunchout> {
     std::optional<std::string> bundleIdentifier; ///< of the application that opens it
     std::vector<std::string> urls;               ///< ways to open it, in the client's order of preference
 
-    /// Returns the URL that the client would open, or null. Valid while the record is unchanged.
-    [[nodiscard]] const std::string* preferredOpenableURL() const { return urls.empty() ? nullptr : &urls.front(); }
-
     static constexpr auto fields()
     {
         return std::tuple{platform::field("bundleIdentifier", &ZRPunchout::bundleIdentifier),

@@ -24,17 +24,6 @@ using platform::Bytes;
 
 namespace {
 
-/// Returns the classes of records in a session file.
-const platform::RecordClasses& fileRecordClasses()
-{
-    static const auto classes = [] {
-        platform::RecordClasses all = tavrindRecordClasses();
-        all.add<ClientSessionHeader>();
-        return all;
-    }();
-    return classes;
-}
-
 std::string archived(const std::string& text)
 {
     return platform::archiveValue(text);
@@ -45,14 +34,14 @@ std::string archived(const platform::Record& record)
     return platform::archive(record);
 }
 
-/// Returns the next record, or null if it can't be read.
-std::shared_ptr<platform::Record> readNext(ArchivedDataIterator& records)
+/// Returns the session's header, or null if the next record is none.
+std::shared_ptr<ClientSessionHeader> readHeader(ArchivedDataIterator& records)
 {
     const auto archive = records.readNextObject();
     if (!archive) return nullptr;
-    auto record = platform::unarchive(*archive, fileRecordClasses());
+    const auto record = platform::unarchive(*archive, sessionFileClasses());
     if (!record) log(kLogFeedbackStorage).error("{}", record.error().reason());
-    return record.value_or(nullptr);
+    return std::dynamic_pointer_cast<ClientSessionHeader>(record.value_or(nullptr));
 }
 
 } // namespace
@@ -181,26 +170,24 @@ FileReading FileContainer::_unarchiveObject(const Bytes& data)
     if (!version || !version->asString()) return _notRead(FeedbackFate::Unreadable, "version string not stored");
     if (*version->asString() != _store->version)
         return _notRead(FeedbackFate::OtherVersion, "version not supported: " + *version->asString());
-    const auto header = std::dynamic_pointer_cast<ClientSessionHeader>(readNext(records));
+    const auto header = readHeader(records);
     if (!header) return _notRead(FeedbackFate::Unreadable, "client session not stored");
 
-    std::vector<std::shared_ptr<TavrinFeedback>> feedbacks;
+    const auto session = std::make_shared<StoredSession>(*header, data);
     while (records.hasMore()) {
         const std::uint64_t position = records.position();
-        const auto record = readNext(records);
-        if (!record)
+        const auto archive = records.readNextObject();
+        const auto added = archive ? session->add(*archive) : platform::Result<bool>(false);
+        if (!added) log(kLogFeedbackStorage).error("{}", added.error().reason());
+        if (!archive || !added)
             log(kLogFeedbackStorage).error("could not unarchive feedback range {} size {}", position, records.size());
-        auto feedback = std::dynamic_pointer_cast<TavrinFeedback>(record);
-        if (!feedback) {
+        if (!added.value_or(false)) {
             log(kLogFeedbackStorage).error("tavrin feedback expected");
             break;
         }
-        feedbacks.push_back(std::move(feedback));
     }
-    const std::uint64_t lost = _feedbackCount - std::min<std::uint64_t>(_feedbackCount, feedbacks.size());
-    return {.session = std::make_shared<StoredSession>(*header, std::move(feedbacks)),
-            .lost = lost,
-            .fate = FeedbackFate::DamagedTail};
+    const std::uint64_t lost = _feedbackCount - std::min<std::uint64_t>(_feedbackCount, session->recordedEvents());
+    return {.session = session, .lost = lost, .fate = FeedbackFate::DamagedTail};
 }
 
 void FileContainer::countFeedback()

@@ -1,65 +1,62 @@
 #include "tavrind/SessionProcessingHelper.h"
 
-#include <ranges>
-
 namespace tavrin {
 
-namespace {
+using platform::ArchivedRecord;
 
-template <class Map> std::vector<typename Map::mapped_type> valuesOf(const Map& map)
+void SessionProcessingHelper::show(const ArchivedRecord<ZRResultSection>& section)
 {
-    const auto values = map | std::views::values;
-    return {values.begin(), values.end()};
+    show(section["results"_field]);
 }
 
-} // namespace
-
-void SessionProcessingHelper::show(ZRResultRankingFeedback& ranking)
+void SessionProcessingHelper::show(const ArchivedRecord<ZRResultRankingFeedback>& ranking)
 {
-    show(ranking.hiddenResults);
-    show(ranking.duplicateResults);
-    show(ranking.result);
+    show(ranking["hiddenResults"_field]);
+    show(ranking["duplicateResults"_field]);
+    show(ranking["result"_field]);
 }
 
-void SessionProcessingHelper::show(ZRSectionRankingFeedback& ranking)
+void SessionProcessingHelper::show(const ArchivedRecord<ZRSectionRankingFeedback>& ranking)
 {
-    show(ranking.section);
-    show(ranking.results);
+    show(ranking["section"_field]);
+    show(ranking["results"_field]);
 }
 
-const std::string& SessionProcessingHelper::replacementForIdentifier(const std::string& identifier)
+std::int32_t SessionProcessingHelper::replacementForIdentifier(std::string_view identifier)
 {
-    const auto [entry, isNew] = _privateIdMapping.try_emplace(identifier);
-    if (isNew) entry->second = std::to_string(_nextMappedId++);
+    const auto [entry, isNew] = _privateIdMapping.try_emplace(identifier, _nextMappedId);
+    if (isNew) ++_nextMappedId;
     return entry->second;
 }
 
-void SessionProcessingHelper::identifierReferenced(const std::string& replacement,
-                                                   std::shared_ptr<ZRSearchResult> result)
+std::string SessionProcessingHelper::replacedIdentifier(std::string_view identifier) const
 {
-    if (!_expandedIdSet.contains(replacement)) _idResultMap.try_emplace(replacement, std::move(result));
+    return std::to_string(_privateIdMapping.at(identifier));
 }
 
-void SessionProcessingHelper::identifierReferenced(const std::string& replacement,
-                                                   std::shared_ptr<ZRSearchSuggestion> suggestion)
+void SessionProcessingHelper::_refer(Archives& map, std::int32_t replacement, std::string_view archive)
 {
-    if (!_expandedIdSet.contains(replacement)) _idSuggestionMap.try_emplace(replacement, std::move(suggestion));
+    if (!_isExpanded(replacement)) map.try_emplace(replacement, archive);
 }
 
-void SessionProcessingHelper::identifierExpanded(const std::string& replacement)
+void SessionProcessingHelper::identifierReferenced(std::int32_t replacement,
+                                                   const ArchivedRecord<ZRSearchResult>& result)
 {
-    _expandedIdSet.insert(replacement);
+    _refer(_idResultMap, replacement, result.bytes());
+}
+
+void SessionProcessingHelper::identifierReferenced(std::int32_t replacement,
+                                                   const ArchivedRecord<ZRSearchSuggestion>& suggestion)
+{
+    _refer(_idSuggestionMap, replacement, suggestion.bytes());
+}
+
+void SessionProcessingHelper::identifierExpanded(std::int32_t replacement)
+{
+    const auto index = static_cast<std::size_t>(replacement);
+    if (index >= _expandedIdSet.size()) _expandedIdSet.resize(index + 1);
+    _expandedIdSet[index] = true;
     if (_idResultMap.erase(replacement) == 0) _idSuggestionMap.erase(replacement);
-}
-
-std::vector<std::shared_ptr<ZRSearchResult>> SessionProcessingHelper::missingResults() const
-{
-    return valuesOf(_idResultMap);
-}
-
-std::vector<std::shared_ptr<ZRSearchSuggestion>> SessionProcessingHelper::missingSuggestions() const
-{
-    return valuesOf(_idSuggestionMap);
 }
 
 } // namespace tavrin

@@ -3,93 +3,89 @@
 #include <cstdint>
 #include <map>
 #include <memory>
+#include <optional>
 #include <string>
+#include <string_view>
 #include <unordered_map>
-#include <unordered_set>
 #include <vector>
 
+#include "platform/values/ArchivedRecord.h"
 #include "searchrecords/ZRResultFeedback.h"
 
 namespace tavrin {
 
+using platform::operator""_field;
+
 /// Replaces the clients' identifiers in one session's events by numbers, and finds results and suggestions that the
 /// events refer to but never show.
 ///
-/// One helper serves one pass: process each event in time order, then ask what is missing. Identifiers are replaced in
-/// the records themselves; the missing records are shared with the events. One thread at a time.
+/// One helper serves one pass: process each event in time order, write it with `replacedIdentifier`, then ask what is
+/// missing. The events' archives must outlive the helper; they stay as they are. One thread at a time.
 class SessionProcessingHelper {
 public:
     // For a record that an event shows with all its properties.
-    void show(ZRSearchResult& result) { _showLeaf(result); }
-    void show(ZRSearchSuggestion& suggestion) { _showLeaf(suggestion); }
-    void show(ZRResultSection& section) { show(section.results); }
-    void show(ZRResultRankingFeedback& ranking);
-    void show(ZRSectionRankingFeedback& ranking);
-    template <class T> void show(const std::shared_ptr<T>& record)
-    {
-        if (record) show(*record);
-    }
-    template <class T> void show(const std::vector<std::shared_ptr<T>>& records)
+    void show(const platform::ArchivedRecord<ZRSearchResult>& result) { _showLeaf(result); }
+    void show(const platform::ArchivedRecord<ZRSearchSuggestion>& suggestion) { _showLeaf(suggestion); }
+    void show(const platform::ArchivedRecord<ZRResultSection>& section);
+    void show(const platform::ArchivedRecord<ZRResultRankingFeedback>& ranking);
+    void show(const platform::ArchivedRecord<ZRSectionRankingFeedback>& ranking);
+    template <class T> void show(const platform::ArchivedArray<std::shared_ptr<T>>& records)
     {
         for (const auto& record : records) show(record);
     }
-    template <class T> void show(const RecordArray<T>& records)
+    template <class T> void show(const std::optional<T>& records)
     {
         if (records) show(*records);
     }
 
     // For a result or suggestion that an event only refers to.
-    template <class T> void refer(const std::shared_ptr<T>& record)
+    template <class T> void refer(const platform::ArchivedRecord<T>& record)
     {
-        if (record && _replaceIdentifier(*record)) identifierReferenced(*record->identifier, record);
+        if (const auto identifier = record["identifier"_field])
+            identifierReferenced(replacementForIdentifier(*identifier), record);
     }
-    template <class T> void refer(const RecordArray<T>& records)
+    template <class T> void refer(const std::optional<platform::ArchivedArray<std::shared_ptr<T>>>& records)
     {
         if (!records) return;
         for (const auto& record : *records) refer(record);
     }
 
-    /// Returns the number that replaces an identifier, counted from "1". Equal identifiers get equal numbers. The
-    /// reference is valid as long as the helper.
-    [[nodiscard]] const std::string& replacementForIdentifier(const std::string& identifier);
+    /// Returns the number that replaces an identifier, counted from 1. Equal identifiers get equal numbers.
+    std::int32_t replacementForIdentifier(std::string_view identifier);
+    /// Returns the number of an identifier that was replaced before, as text.
+    [[nodiscard]] std::string replacedIdentifier(std::string_view identifier) const;
 
-    /// Notes that an event refers to a record, by its replaced identifier. Keeps the first reference until an event
-    /// shows the identifier.
-    void identifierReferenced(const std::string& replacement, std::shared_ptr<ZRSearchResult> result);
-    void identifierReferenced(const std::string& replacement, std::shared_ptr<ZRSearchSuggestion> suggestion);
-    /// Notes that an event shows the record with this replaced identifier.
-    void identifierExpanded(const std::string& replacement);
+    /// Notes that an event refers to a record, by the number that replaces its identifier. Keeps the first reference
+    /// until an event shows the identifier.
+    void identifierReferenced(std::int32_t replacement, const platform::ArchivedRecord<ZRSearchResult>& result);
+    void identifierReferenced(std::int32_t replacement, const platform::ArchivedRecord<ZRSearchSuggestion>& suggestion);
+    /// Notes that an event shows the record with this number.
+    void identifierExpanded(std::int32_t replacement);
 
-    /// Return the records that events refer to but none shows, with replaced identifiers, in the order of their first
-    /// appearance.
-    [[nodiscard]] std::vector<std::shared_ptr<ZRSearchResult>> missingResults() const;
-    [[nodiscard]] std::vector<std::shared_ptr<ZRSearchSuggestion>> missingSuggestions() const;
+    /// The archives of records, which have the clients' identifiers, by the number.
+    using Archives = std::map<std::int32_t, std::string_view>;
+    /// Return the records that events refer to but none shows, in the order of their first appearance.
+    [[nodiscard]] const Archives& missingResults() const { return _idResultMap; }
+    [[nodiscard]] const Archives& missingSuggestions() const { return _idSuggestionMap; }
 
 private:
-    /// Orders replaced identifiers as numbers.
-    struct ByNumber {
-        bool operator()(const std::string& a, const std::string& b) const
-        {
-            return a.size() != b.size() ? a.size() < b.size() : a < b;
-        }
-    };
-
-    /// Returns false for a record without an identifier.
-    template <class T> bool _replaceIdentifier(T& record)
+    template <class T> void _showLeaf(const platform::ArchivedRecord<T>& record)
     {
-        if (record.identifier) record.identifier = replacementForIdentifier(*record.identifier);
-        return record.identifier.has_value();
+        if (const auto identifier = record["identifier"_field])
+            identifierExpanded(replacementForIdentifier(*identifier));
     }
-    template <class T> void _showLeaf(T& record)
+    [[nodiscard]] bool _isExpanded(std::int32_t replacement) const
     {
-        if (_replaceIdentifier(record)) identifierExpanded(*record.identifier);
+        return static_cast<std::size_t>(replacement) < _expandedIdSet.size() &&
+               _expandedIdSet[static_cast<std::size_t>(replacement)];
     }
+    void _refer(Archives& map, std::int32_t replacement, std::string_view archive);
 
-    std::unordered_map<std::string, std::string> _privateIdMapping;
+    std::unordered_map<std::string_view, std::int32_t> _privateIdMapping;
     std::int32_t _nextMappedId = 1;
-    std::map<std::string, std::shared_ptr<ZRSearchResult>, ByNumber> _idResultMap;
-    std::map<std::string, std::shared_ptr<ZRSearchSuggestion>, ByNumber> _idSuggestionMap;
-    std::unordered_set<std::string> _expandedIdSet;
+    Archives _idResultMap;
+    Archives _idSuggestionMap;
+    std::vector<bool> _expandedIdSet; ///< by the number
 };
 
 } // namespace tavrin

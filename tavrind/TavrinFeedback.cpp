@@ -1,13 +1,15 @@
 #include "tavrind/TavrinFeedback.h"
 
 #include "CoreTavrin/TAVRecordClasses.h"
-#include "platform/values/Dictionary.h"
-#include "platform/values/Json.h"
+#include "platform/values/Archive.h"
+#include "platform/values/JsonSink.h"
 #include "tavrind/FeedbackClasses.h"
 #include "tavrind/FeedbackJson.h"
 #include "tavrind/TavrinSessionFeedback.h"
 
 namespace tavrin {
+
+using platform::operator""_field;
 
 TavrinFeedback::TavrinFeedback() : TavrinFeedback(nullptr, 0, {}, {}) {}
 
@@ -35,38 +37,52 @@ EventType TavrinFeedback::type() const
     return _class->eventType(_record());
 }
 
-platform::Dictionary TavrinFeedback::_commonDictionary() const
+void TavrinFeedback::process(const Archived& event, SessionProcessingHelper& helper)
 {
-    platform::Dictionary event;
-    event.reserve(8); // most records add up to four fields, and an event four more
-    JsonFields fields(event);
-    _class->addFields(fields, _record());
-    const EventType eventType = type();
-    if (requiresQueryId(eventType)) {
-        fields("query_id", queryId);
-        if (clientQueryId != 0) fields("client_query_id", clientQueryId);
-    }
-    fields("type", eventTypeToString(eventType));
-    return event;
+    const auto record = event["feedback"_field];
+    if (const auto process = feedbackClassOf(record).process) process(record, helper);
 }
 
-platform::Dictionary TavrinFeedback::dictionary() const
+void TavrinFeedback::write(platform::JsonSink& sink, const Archived& event, std::uint64_t timestamp,
+                           const SessionProcessingHelper* identifiers)
 {
-    platform::Dictionary event = _commonDictionary();
-    event.set("timestamp", relTimestamp);
-    return event;
+    const auto record = event["feedback"_field];
+    const FeedbackClass& row = feedbackClassOf(record);
+    EventContext context{.type = row.archivedEventType(record), .timestamp = timestamp};
+    if (requiresQueryId(context.type)) {
+        context.queryId = event["query_id"_field];
+        if (const std::uint64_t clientQueryId = event["_clientQueryId"_field]; clientQueryId != 0)
+            context.clientQueryId = clientQueryId;
+    }
+    sink.beginObject();
+    JsonFields fields(sink, context, row.process ? identifiers : nullptr);
+    row.addFields(fields, record);
+    fields.finish();
+    sink.endObject();
+}
+
+void TavrinFeedback::_writeTo(platform::JsonSink& sink, std::uint64_t timestamp) const
+{
+    const std::string bytes = platform::archive(*this);
+    platform::OpenArchive archive(tavrindRecordClasses());
+    if (archive.open(bytes))
+        write(sink, archive.root().as<TavrinFeedback>(), timestamp);
+    else
+        sink.null(); // nested too deep
+}
+
+platform::Value TavrinFeedback::dictionary() const
+{
+    platform::JsonValueSink sink;
+    _writeTo(sink, relTimestamp);
+    return sink.take();
 }
 
 std::string TavrinFeedback::description() const
 {
-    platform::Dictionary event = _commonDictionary();
-    event.set("timestamp", mach_duration_to_milliseconds(timestamp()));
-    return platform::toJson(std::move(event));
-}
-
-void TavrinFeedback::process(SessionProcessingHelper& helper)
-{
-    if (_feedback) _class->process(*_feedback, helper);
+    platform::JsonTextSink sink;
+    _writeTo(sink, mach_duration_to_milliseconds(timestamp()));
+    return std::move(sink.text());
 }
 
 bool TavrinFeedback::decodeField(std::string_view key, platform::Decoder& decoder, std::size_t& next)

@@ -5,7 +5,7 @@
 #include <memory>
 #include <string>
 
-#include "platform/values/Dictionary.h"
+#include "platform/values/ArchivedRecord.h"
 #include "searchrecords/ZRFeedback.h"
 
 namespace tavrin {
@@ -50,14 +50,19 @@ struct TavrinFeedback : platform::RecordOf<TavrinFeedback> {
         return a.timestamp() <=> b.timestamp();
     }
 
-    /// Returns the event in its uploaded form; docs/feedback.md shows one of each type. Headers, features and custom
-    /// JSON are shared with the record.
-    [[nodiscard]] platform::Dictionary dictionary() const;
+    /// Returns the event in its uploaded form, a dictionary; docs/feedback.md shows one of each type.
+    [[nodiscard]] platform::Value dictionary() const;
     /// Returns the event as one line of JSON for logs and listeners. Its "timestamp" is that of the record, in
     /// milliseconds of the host's clock.
     [[nodiscard]] std::string description() const;
-    /// Replaces the identifiers in the record before it leaves the device. Call it once: see `FeedbackClass::process`.
-    void process(SessionProcessingHelper& helper);
+
+    /// An event in a session file.
+    using Archived = platform::ArchivedRecord<TavrinFeedback>;
+    /// Assigns replacements to the identifiers in an event before it leaves the device.
+    static void process(const Archived& event, SessionProcessingHelper& helper);
+    /// Writes an event in its uploaded form. With `identifiers`, which has processed it, those are replaced.
+    static void write(platform::JsonSink& sink, const Archived& event, std::uint64_t timestamp,
+                      const SessionProcessingHelper* identifiers = nullptr);
 
     static constexpr auto fields()
     {
@@ -71,8 +76,8 @@ struct TavrinFeedback : platform::RecordOf<TavrinFeedback> {
     bool decodeField(std::string_view key, platform::Decoder& decoder, std::size_t& next) override;
 
 private:
-    /// Returns `dictionary()` without the timestamp, which is its last key.
-    [[nodiscard]] platform::Dictionary _commonDictionary() const;
+    /// Writes this event by way of its archive.
+    void _writeTo(platform::JsonSink& sink, std::uint64_t timestamp) const;
     /// Returns the record, or an empty one.
     [[nodiscard]] const ZRFeedback& _record() const;
     void _setFeedback(std::shared_ptr<ZRFeedback> feedback);

@@ -2,6 +2,7 @@
 
 #include <cstdint>
 #include <memory>
+#include <optional>
 #include <span>
 #include <string_view>
 #include <vector>
@@ -38,8 +39,8 @@ struct TavrinSessionEndFeedback : platform::RecordOf<TavrinSessionEndFeedback, Z
 
     /// Returns the texts of the reasons, by value.
     [[nodiscard]] static constexpr std::span<const std::string_view> eventTypes() { return kTexts<SessionEndReason>; }
-    /// Returns the text of a reason; null for a number without one, which a damaged session file may hold.
-    [[nodiscard]] static const platform::Value& triggerEventEnumToString(SessionEndReason reason)
+    /// Returns the text of a reason; nothing for a number without one, which a damaged session file may hold.
+    [[nodiscard]] static std::optional<std::string_view> triggerEventEnumToString(SessionEndReason reason)
     {
         return enumToString(reason);
     }

@@ -9,11 +9,11 @@
 #include <limits>
 
 #include <fmt/format.h>
-#include <openssl/evp.h>
 #include <simdjson.h>
 
 #include "platform/values/Dictionary.h"
 #include "platform/values/Error.h"
+#include "platform/values/JsonText.h"
 
 namespace platform {
 
@@ -182,48 +182,6 @@ Value convert(dom::element element)
 
 // Writing
 
-/// How a byte of a string is escaped.
-enum class Escape : std::uint8_t { None, Short, Unicode };
-
-constexpr auto kEscapes = [] {
-    std::array<Escape, 256> escapes{};
-    for (int c = 0; c < 0x20; ++c) escapes[c] = Escape::Unicode;
-    for (const unsigned char c : {'"', '\\', '\b', '\f', '\n', '\r', '\t'}) escapes[c] = Escape::Short;
-    return escapes;
-}();
-
-constexpr char shortEscape(char c)
-{
-    switch (c) {
-    case '\b': return 'b';
-    case '\f': return 'f';
-    case '\n': return 'n';
-    case '\r': return 'r';
-    case '\t': return 't';
-    default: return c;
-    }
-}
-
-/// Replaces each byte that is not part of valid UTF-8 by U+FFFD.
-std::string repaired(std::string_view text)
-{
-    std::string valid;
-    valid.reserve(text.size() + 16);
-    for (std::size_t i = 0; i < text.size();) {
-        const auto lead = static_cast<unsigned char>(text[i]);
-        const std::size_t length = lead < 0x80 ? 1 : lead < 0xe0 ? 2 : lead < 0xf0 ? 3 : 4;
-        const std::string_view character = text.substr(i, length);
-        if (character.size() == length && simdjson::validate_utf8(character)) {
-            valid += character;
-            i += length;
-        } else {
-            valid += "\xef\xbf\xbd";
-            ++i;
-        }
-    }
-    return valid;
-}
-
 /// Stores the text.
 struct TextSink {
     std::string text;
@@ -247,81 +205,18 @@ public:
         switch (value.type()) {
         case Value::Type::Null: return _sink.put("null");
         case Value::Type::Bool: return _sink.put(*value.asBool() ? "true" : "false");
-        case Value::Type::Int: return writeNumber(*value.asInt());
-        case Value::Type::UInt: return writeNumber(*value.asUInt());
-        case Value::Type::Double: return writeReal(*value.asDouble());
-        case Value::Type::String: return writeString(*value.asString());
-        case Value::Type::Bytes: return writeBase64(value.asBytes()->view());
-        case Value::Type::Date: return writeReal(secondsSince1970(*value.asDate()));
+        case Value::Type::Int: return json::putNumber(_sink, *value.asInt());
+        case Value::Type::UInt: return json::putNumber(_sink, *value.asUInt());
+        case Value::Type::Double: return json::putReal(_sink, *value.asDouble());
+        case Value::Type::String: return json::putString(_sink, *value.asString());
+        case Value::Type::Bytes: return json::putBase64(_sink, value.asBytes()->view());
+        case Value::Type::Date: return json::putReal(_sink, secondsSince1970(*value.asDate()));
         case Value::Type::Array: return writeArray(*value.asArray());
         case Value::Type::Dictionary: return writeDictionary(*value.asDictionary());
         }
     }
 
 private:
-    template <class Number, class... Format> void writeNumber(Number number, Format... format)
-    {
-        std::array<char, 32> digits;
-        const auto result = std::to_chars(digits.begin(), digits.end(), number, format...);
-        _sink.put(std::string_view(digits.begin(), result.ptr));
-    }
-
-    void writeReal(double number)
-    {
-        // Readers take large doubles without an exponent for integers out of range, and "-0" for an integer zero.
-        constexpr double kIntegerLimit = 9223372036854775808.0;
-        if (!std::isfinite(number))
-            _sink.put("null");
-        else if (std::abs(number) >= kIntegerLimit)
-            writeNumber(number, std::chars_format::scientific);
-        else if (number == 0 && std::signbit(number))
-            _sink.put("-0.0");
-        else
-            writeNumber(number);
-    }
-
-    void writeString(std::string_view text)
-    {
-        if (simdjson::validate_utf8(text))
-            writeValidString(text);
-        else
-            writeValidString(repaired(text));
-    }
-
-    void writeValidString(std::string_view text)
-    {
-        _sink.put('"');
-        std::size_t begin = 0;
-        for (std::size_t i = 0; i < text.size(); ++i) {
-            const auto c = static_cast<unsigned char>(text[i]);
-            if (kEscapes[c] == Escape::None) continue;
-            _sink.put(text.substr(begin, i - begin));
-            begin = i + 1;
-            if (kEscapes[c] == Escape::Short) {
-                _sink.put('\\');
-                _sink.put(shortEscape(text[i]));
-            } else {
-                _sink.put(fmt::format("\\u{:04x}", c));
-            }
-        }
-        _sink.put(text.substr(begin));
-        _sink.put('"');
-    }
-
-    void writeBase64(std::string_view bytes)
-    {
-        constexpr std::size_t kChunk = 3 * 1024;
-        std::array<unsigned char, kChunk / 3 * 4 + 1> encoded;
-        _sink.put('"');
-        for (; !bytes.empty(); bytes.remove_prefix(std::min(kChunk, bytes.size()))) {
-            const int length = EVP_EncodeBlock(encoded.data(), reinterpret_cast<const unsigned char*>(bytes.data()),
-                                               static_cast<int>(std::min(kChunk, bytes.size())));
-            _sink.put(
-                std::string_view(reinterpret_cast<const char*>(encoded.data()), static_cast<std::size_t>(length)));
-        }
-        _sink.put('"');
-    }
-
     void writeArray(const Value::Array& array)
     {
         writeContainer('[', ']', array, [this](const Value& element) { write(element); });
@@ -330,7 +225,7 @@ private:
     void writeDictionary(const Dictionary& dictionary)
     {
         writeContainer('{', '}', dictionary, [this](const Dictionary::Entry& entry) {
-            writeString(entry.first);
+            json::putString(_sink, entry.first);
             _sink.put(_pretty ? std::string_view(": ") : std::string_view(":"));
             write(entry.second);
         });

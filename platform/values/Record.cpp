@@ -44,26 +44,6 @@ Value valueFromError(const Error& error)
     return dictionary;
 }
 
-/// Returns nothing if an entry is of the wrong type. Missing entries read as empty.
-std::optional<Error> errorFromValue(const Value& value)
-{
-    const Value& domain = value["domain"];
-    const Value& code = value["code"];
-    const Value& userInfo = value["userInfo"];
-    const Value& underlying = value["underlying"];
-    if (!value.asDictionary() || !(domain.isNull() || domain.asString()) || !(code.isNull() || code.asInt()) ||
-        !(userInfo.isNull() || userInfo.asDictionary()))
-        return std::nullopt;
-
-    Error error(domain.asString() ? *domain.asString() : std::string(), code.asInt().value_or(0), userInfo);
-    if (!underlying.isNull()) {
-        auto cause = errorFromValue(underlying);
-        if (!cause) return std::nullopt;
-        error.underlying = std::make_shared<const Error>(std::move(*cause));
-    }
-    return error;
-}
-
 } // namespace
 
 void Decoder::fail(std::string reason, std::int64_t code)
@@ -153,6 +133,25 @@ void decodeRecordInto(Decoder& decoder, Record& record)
     decodeFields(decoder, record);
 }
 
+std::optional<Error> errorFromDictionary(const Value& value)
+{
+    const Value& domain = value["domain"];
+    const Value& code = value["code"];
+    const Value& userInfo = value["userInfo"];
+    const Value& underlying = value["underlying"];
+    if (!value.asDictionary() || !(domain.isNull() || domain.asString()) || !(code.isNull() || code.asInt()) ||
+        !(userInfo.isNull() || userInfo.asDictionary()))
+        return std::nullopt;
+
+    Error error(domain.asString() ? *domain.asString() : std::string(), code.asInt().value_or(0), userInfo);
+    if (!underlying.isNull()) {
+        auto cause = errorFromDictionary(underlying);
+        if (!cause) return std::nullopt;
+        error.underlying = std::make_shared<const Error>(std::move(*cause));
+    }
+    return error;
+}
+
 namespace detail {
 
 void encodeError(Encoder& encoder, const Error& error)
@@ -164,7 +163,7 @@ Error decodeError(Decoder& decoder)
 {
     const Value value = decoder.value();
     if (decoder.failed()) return {};
-    auto error = errorFromValue(value);
+    auto error = errorFromDictionary(value);
     if (!error) decoder.fail("not an error");
     return error.value_or(Error());
 }

@@ -2,6 +2,7 @@
 
 #include <concepts>
 #include <cstdint>
+#include <limits>
 #include <memory>
 #include <optional>
 #include <span>
@@ -127,6 +128,19 @@ private:
     std::optional<Failure> _failure;
 };
 
+class Record;
+
+/// What archives may hold for a field: the field's C++ type, for readers that build no record.
+struct FieldShape {
+    enum class Kind : std::uint8_t { Bool, Integer, Unsigned, Real, Text, Bytes, Date, Value, Error, Record, Array };
+    Kind kind{};
+    std::int64_t minimum = 0; ///< of an integer
+    std::uint64_t maximum = 0;
+    bool (*accepts)(std::string_view text) = nullptr; ///< whether a text fits; null if all do
+    bool (*isA)(const Record* record) = nullptr;      ///< whether a record's class fits
+    const FieldShape* element = nullptr;              ///< of an array
+};
+
 /// Base of every record. Derive from `RecordOf`, which implements these functions.
 class Record {
 public:
@@ -139,14 +153,16 @@ public:
     /// found.
     virtual bool decodeField(std::string_view key, Decoder& decoder, std::size_t& next);
 
-protected:
-    /// Reads a field into a record of the class that lists it.
+    /// One field of a class.
     struct FieldReader {
         std::string_view name;
-        void (*read)(Record&, Decoder&);
+        void (*read)(Record&, Decoder&); ///< into a record of the class
+        const FieldShape* shape;
     };
     /// Returns all fields in order, those of the base first.
     [[nodiscard]] virtual std::span<const FieldReader> fieldReaders() const { return {}; }
+    /// Returns the same fields as a tuple of `Field`.
+    static constexpr auto allFields() { return std::tuple<>(); }
 };
 
 template <class Owner, class Member> struct Field {
@@ -158,13 +174,25 @@ template <class Owner, class Member> constexpr Field<Owner, Member> field(std::s
     return {name, member};
 }
 
+/// A record class that a decoder accepts.
+struct RecordClass {
+    std::shared_ptr<Record> (*make)();
+    std::shared_ptr<const Record> prototype; ///< with the initial values of all fields
+    std::span<const Record::FieldReader> fields;
+
+    [[nodiscard]] std::shared_ptr<Record> operator()() const { return make(); }
+};
+
 /// The record classes that a decoder accepts, by name. Fill it on one thread; then any thread may read it.
 class RecordClasses {
 public:
-    using Factory = std::shared_ptr<Record> (*)();
     template <class T> void add()
     {
-        _factories[T::kClass] = []() -> std::shared_ptr<Record> { return std::make_shared<T>(); };
+        auto prototype = std::make_shared<const T>();
+        const auto fields = static_cast<const Record&>(*prototype).fieldReaders();
+        _classes[T::kClass] = {.make = []() -> std::shared_ptr<Record> { return std::make_shared<T>(); },
+                               .prototype = std::move(prototype),
+                               .fields = fields};
     }
     template <class... T> [[nodiscard]] static RecordClasses of()
     {
@@ -172,18 +200,24 @@ public:
         (classes.add<T>(), ...);
         return classes;
     }
-    void addAll(const RecordClasses& other) { _factories.insert(other._factories.begin(), other._factories.end()); }
+    void addAll(const RecordClasses& other) { _classes.insert(other._classes.begin(), other._classes.end()); }
+    /// Returns a class, or null for an unknown name. Valid until a class is added.
+    [[nodiscard]] const RecordClass* find(std::string_view className) const
+    {
+        const auto found = _classes.find(className);
+        return found == _classes.end() ? nullptr : &found->second;
+    }
     /// Returns a new record, or null for an unknown name.
     [[nodiscard]] std::shared_ptr<Record> make(std::string_view className) const
     {
-        auto found = _factories.find(className);
-        return found == _factories.end() ? nullptr : found->second();
+        const RecordClass* found = find(className);
+        return found ? found->make() : nullptr;
     }
-    [[nodiscard]] auto begin() const { return _factories.begin(); }
-    [[nodiscard]] auto end() const { return _factories.end(); }
+    [[nodiscard]] auto begin() const { return _classes.begin(); }
+    [[nodiscard]] auto end() const { return _classes.end(); }
 
 private:
-    std::unordered_map<std::string_view, Factory> _factories;
+    std::unordered_map<std::string_view, RecordClass> _classes;
 };
 
 void encodeRecord(Encoder& encoder, const Record& record);
@@ -202,6 +236,10 @@ template <class T> [[nodiscard]] std::shared_ptr<T> decodeRecordIfA(Decoder& dec
 /// Reads the next record into `record`; fails if it is of another class.
 void decodeRecordInto(Decoder& decoder, Record& record);
 
+/// Returns the error that a field of type Error is encoded as; nothing if an entry is of the wrong type. Missing
+/// entries read as empty.
+[[nodiscard]] std::optional<Error> errorFromDictionary(const Value& value);
+
 namespace detail {
 
 template <class T> struct IsOptional : std::false_type {};
@@ -210,6 +248,9 @@ template <class T> struct IsVector : std::false_type {};
 template <class T> struct IsVector<std::vector<T>> : std::true_type {};
 template <class T> struct IsShared : std::false_type {};
 template <class T> struct IsShared<std::shared_ptr<T>> : std::true_type {};
+
+template <class T> consteval FieldShape shapeOf();
+template <class T> inline constexpr FieldShape kShape = shapeOf<T>();
 
 void encodeError(Encoder& encoder, const Error& error);
 [[nodiscard]] Error decodeError(Decoder& decoder);
@@ -314,12 +355,49 @@ template <class T> void decodeValue(Decoder& decoder, T& value)
     }
 }
 
+template <class T> consteval FieldShape shapeOf()
+{
+    using Kind = FieldShape::Kind;
+    if constexpr (IsOptional<T>::value)
+        return shapeOf<typename T::value_type>();
+    else if constexpr (std::is_enum_v<T>)
+        return shapeOf<std::underlying_type_t<T>>();
+    else if constexpr (std::is_same_v<T, bool>)
+        return {.kind = Kind::Bool};
+    else if constexpr (std::is_integral_v<T>)
+        return {.kind = std::is_signed_v<T> ? Kind::Integer : Kind::Unsigned,
+                .minimum = static_cast<std::int64_t>(std::numeric_limits<T>::min()),
+                .maximum = static_cast<std::uint64_t>(std::numeric_limits<T>::max())};
+    else if constexpr (std::is_floating_point_v<T>)
+        return {.kind = Kind::Real};
+    else if constexpr (std::is_same_v<T, std::string>)
+        return {.kind = Kind::Text};
+    else if constexpr (std::is_same_v<T, Bytes>)
+        return {.kind = Kind::Bytes};
+    else if constexpr (std::is_same_v<T, Date>)
+        return {.kind = Kind::Date};
+    else if constexpr (std::is_same_v<T, Value>)
+        return {.kind = Kind::Value};
+    else if constexpr (std::is_same_v<T, Error>)
+        return {.kind = Kind::Error};
+    else if constexpr (IsShared<T>::value)
+        return {.kind = Kind::Record, .isA = [](const Record* record) {
+                    return dynamic_cast<const typename T::element_type*>(record) != nullptr;
+                }};
+    else if constexpr (IsVector<T>::value)
+        return {.kind = Kind::Array, .element = &kShape<typename T::value_type>};
+    else // Uuid, Url
+        return {.kind = Kind::Text, .accepts = [](std::string_view text) { return T::parse(text).has_value(); }};
+}
+
 } // namespace detail
 
 /// Base of a record `Self` that adds fields to the record `Base`; see the top of this file.
 template <class Self, class Base = Record> class RecordOf : public Base {
 public:
     using Base::Base;
+
+    static constexpr auto allFields() { return std::tuple_cat(Base::allFields(), Self::fields()); }
 
     [[nodiscard]] std::string_view className() const override { return Self::kClass; }
 
@@ -337,14 +415,13 @@ public:
             Self::fields());
     }
 
-protected:
     [[nodiscard]] std::span<const Record::FieldReader> fieldReaders() const override
     {
         static const std::vector<Record::FieldReader> readers = [this] {
             const auto inherited = Base::fieldReaders();
             std::vector<Record::FieldReader> all(inherited.begin(), inherited.end());
             [&all]<std::size_t... I>(std::index_sequence<I...>) {
-                (all.push_back({std::get<I>(Self::fields()).name, readField<I>}), ...);
+                (all.push_back({std::get<I>(Self::fields()).name, readField<I>, shape<I>()}), ...);
             }(std::make_index_sequence<std::tuple_size_v<decltype(Self::fields())>>());
             return all;
         }();
@@ -352,6 +429,11 @@ protected:
     }
 
 private:
+    template <std::size_t I> static const FieldShape* shape()
+    {
+        constexpr auto member = std::get<I>(Self::fields()).member;
+        return &detail::kShape<std::remove_cvref_t<decltype(std::declval<Self&>().*member)>>;
+    }
     template <std::size_t I> static void readField(Record& record, Decoder& decoder)
     {
         constexpr auto member = std::get<I>(Self::fields()).member;
