@@ -6,9 +6,10 @@
 #include "tavrind/OutputStream.h"
 
 struct evp_md_ctx_st;
-struct z_stream_s;
 
 namespace tavrin {
+
+class Deflater;
 
 /// Compresses its input as raw DEFLATE (RFC 1951, without a header) into another stream, which it owns, and computes
 /// the SHA-512 digest of the uncompressed input. It fails when the other stream fails. One thread at a time.
@@ -34,14 +35,13 @@ public:
 
 private:
     /// Compresses `bytes`. Returns false after an error.
-    bool _deflate(std::string_view bytes, int flush);
+    bool _deflate(std::string_view bytes, bool isLast);
     void _fail(platform::Error error);
 
     std::unique_ptr<OutputStream> _outputStream;
-    std::unique_ptr<z_stream_s, void (*)(z_stream_s*)> _stream;
+    std::unique_ptr<Deflater> _stream;
     std::unique_ptr<evp_md_ctx_st, void (*)(evp_md_ctx_st*)> _sha512Context;
     std::array<unsigned char, 64> _digest{};
-    std::array<char, 4096> _destBuffer;
     StreamStatus _status = StreamStatus::NotOpen;
     std::optional<platform::Error> _error;
 };

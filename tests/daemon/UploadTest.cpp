@@ -5,6 +5,7 @@
 
 #include "tavrind/ClientSession.h"
 #include "tavrind/CompressedOutputStream.h"
+#include "tavrind/Deflater.h"
 #include "tavrind/TavrinFeedbackFlusher.h"
 #include "tests/support/FeedbackFixture.h"
 
@@ -460,6 +461,32 @@ TEST_F(UploadTest, DamagedBooksBeginAnew)
 }
 
 // The stream
+
+TEST(DeflaterTest, EitherLibraryWritesAWholeStreamInSmallPieces)
+{
+    std::string text;
+    for (std::size_t i = 0; text.size() < 300'000; ++i) text += std::to_string(i * 2654435761u);
+    text.resize(300'000);
+    for (const auto& make : {&Deflater::make, &Deflater::makeWithZlib}) {
+        for (const auto& [size, step] :
+             {std::pair<std::size_t, std::size_t>{0, 1}, {1, 1}, {5000, 1}, {300'000, 999}, {300'000, 300'000}}) {
+            std::string packed;
+            const auto take = [&packed](std::string_view piece) {
+                EXPECT_TRUE(!piece.empty() && piece.size() <= 4096);
+                packed += piece;
+                return true;
+            };
+            const auto deflater = make();
+            for (std::size_t at = 0; at < size; at += step)
+                EXPECT_TRUE(deflater->write(std::string_view(text).substr(at, step), false, take));
+            EXPECT_TRUE(deflater->write("", true, take));
+            EXPECT_EQ(tools::inflateRaw(packed, 1u << 20).value(), text.substr(0, size));
+        }
+        int calls = 0;
+        EXPECT_FALSE(make()->write(text, true, [&calls](std::string_view) { return ++calls < 3; }));
+        EXPECT_EQ(calls, 3);
+    }
+}
 
 TEST(CompressedOutputStreamTest, RoundTripAndDigest)
 {
