@@ -37,6 +37,7 @@ namespace tavrin::bench {
 namespace {
 
 constexpr std::uint64_t kSessionSize = 4u << 20; ///< the daemon's own limit
+constexpr std::uint64_t kLargestSession = 64u << 20;
 constexpr const char* kGuid = "01234567-89AB-4DEF-8123-456789ABCDEF";
 
 /// A directory of real session files, and what they need of the daemon.
@@ -44,7 +45,7 @@ class Storage {
 public:
     Storage()
         : _store(std::make_shared<const FileContainerStore>(
-              FileContainerStore{*files, _transactions, _diagnosticData, _queue, "bench", kSessionSize}))
+              FileContainerStore{*files, _transactions, _diagnosticData, _queue, "bench", kLargestSession}))
     {}
 
     [[nodiscard]] std::filesystem::path path(const std::string& name) const { return _directory / name; }
@@ -100,12 +101,12 @@ std::string framed(const std::string& archive)
     return std::string(reinterpret_cast<const char*>(&length), sizeof(length)) + archive;
 }
 
-/// A closed file as large as sessions get.
-std::filesystem::path writeSession(const Storage& storage)
+/// A closed file of nearly `size` bytes.
+std::filesystem::path writeSession(const Storage& storage, std::uint64_t size = kSessionSize)
 {
-    const auto file = storage.path("session.1");
+    const auto file = storage.path(fmt::format("session.{}", size));
     const auto container = storage.newContainer(file);
-    for (std::uint64_t search = 1; std::filesystem::file_size(file) < kSessionSize - (8u << 10); ++search) {
+    for (std::uint64_t search = 1; std::filesystem::file_size(file) < size - (8u << 10); ++search) {
         for (auto& record : eventsOfSearch(search))
             container->writeFeedback(std::make_shared<TavrinFeedback>(std::move(record),
                                                                       static_cast<std::int64_t>(search), kGuid,
@@ -255,6 +256,31 @@ std::vector<Row> flush()
                 [&] { return cpuOfEach(1, [&] { (void)deflateAndDigest(json); }); }),
             {"its peak of memory, beside the file's size", fmt::format("{:.1f} MB", peak / 1e6),
              fmt::format("{:.1f} MB", size / 1e6), peak / size, 6, "×"}};
+}
+
+std::vector<Row> flushGrowth()
+{
+    constexpr int kRounds = 9;
+    const OneCore pinned;
+    const Storage storage;
+    std::vector<Row> rows;
+    double first = 0; // of a megabyte in the smallest file
+    for (const std::uint64_t size : {1u << 20, 4u << 20, 16u << 20, 64u << 20}) {
+        const auto file = writeSession(storage, size);
+        const auto megabytes = static_cast<double>(std::filesystem::file_size(file)) / 1e6;
+        const double peak = peakMemoryOf([&] { (void)flushSession(storage, file); }) / 1e6;
+        std::vector<double> times;
+        for (int i = 0; i < kRounds; ++i)
+            times.push_back(cpuOfEach(1, [&] { (void)flushSession(storage, file); }) / megabytes);
+        const double each = median(times);
+        if (first == 0) first = each;
+        rows.push_back({fmt::format("flush of a session file of {:.0f} MB, for each MB, beside one of 1 MB", megabytes),
+                        seconds(each), seconds(first), each / first, 1.5, "×"});
+        rows.push_back({"its peak of memory, beside the file's size", fmt::format("{:.1f} MB", peak),
+                        fmt::format("{:.1f} MB", megabytes), peak / megabytes, 6, "×"});
+        std::filesystem::remove(file);
+    }
+    return rows;
 }
 
 } // namespace tavrin::bench

@@ -181,6 +181,7 @@ private:
 [[nodiscard]] std::vector<Row> append();
 [[nodiscard]] std::vector<Row> archive();
 [[nodiscard]] std::vector<Row> flush();
+[[nodiscard]] std::vector<Row> flushGrowth();
 [[nodiscard]] std::vector<Row> events();
 [[nodiscard]] std::vector<Row> millionEvents();
 

@@ -34,6 +34,7 @@ int main(int argc, char** argv)
                        {"append", append},
                        {"archive", archive},
                        {"flush", flush},
+                       {"growth", flushGrowth},
                        {"events", events},
                        {"million", millionEvents, true}};
 
