@@ -55,6 +55,13 @@ double cpu(pid_t pid)
     return static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_nsec) * 1e-9;
 }
 
+double timeOf(const std::function<void()>& call)
+{
+    const double begin = now();
+    call();
+    return now() - begin;
+}
+
 std::uint64_t numberIn(const std::filesystem::path& path, std::string_view key)
 {
     std::ifstream file(path);
@@ -238,10 +245,11 @@ Daemon::Daemon(const std::string& bagURL, const std::vector<std::string>& enviro
     defaults.set("TAVBagURL", bagURL);
     std::ofstream(_home / "config/com.quorvane.tavrind.json") << platform::toJson(std::move(defaults));
 
-    std::vector<std::string> variables = environment;
+    std::vector<std::string> variables;
     for (const auto& [variable, name] : {std::pair("XDG_RUNTIME_DIR", "run"), std::pair("XDG_CONFIG_HOME", "config"),
                                          std::pair("XDG_CACHE_HOME", "cache"), std::pair("XDG_STATE_HOME", "state")})
         variables.push_back(fmt::format("{}={}", variable, (_home / name).string()));
+    variables.insert(variables.end(), environment.begin(), environment.end());
     const int socket = listenAt(_home / "run/socket");
     std::vector<std::string> command{program};
     if (program == TAVRIND) command.insert(command.end(), {"--log-level", "fault"});

@@ -25,6 +25,8 @@ namespace tavrin::bench {
 /// Seconds of CPU, user and system, that all threads of a process have used so far; 0 is this process.
 [[nodiscard]] double cpu(pid_t pid = 0);
 [[nodiscard]] double median(std::vector<double> values);
+/// Seconds that `call` takes.
+[[nodiscard]] double timeOf(const std::function<void()>& call);
 
 /// Ends the process with what went wrong, and errno's text, unless `holds`.
 void require(bool holds, const std::string& what);
@@ -99,7 +101,7 @@ private:
 /// Private directories and a daemon in them, on a socket of ours. The daemon is `program`, tavrind if not given.
 class Daemon {
 public:
-    /// `defaults` are user defaults beside the bag's URL.
+    /// `environment` may replace the private directories. `defaults` are user defaults beside the bag's URL.
     explicit Daemon(const std::string& bagURL, const std::vector<std::string>& environment = {},
                     const std::string& program = TAVRIND, platform::Dictionary defaults = {});
     [[nodiscard]] std::string address() const { return "unix:path=" + (_home / "run/socket").string(); }
@@ -184,5 +186,6 @@ private:
 [[nodiscard]] std::vector<Row> flushGrowth();
 [[nodiscard]] std::vector<Row> events();
 [[nodiscard]] std::vector<Row> millionEvents();
+[[nodiscard]] std::vector<Row> growth();
 
 } // namespace tavrin::bench

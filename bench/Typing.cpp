@@ -8,6 +8,7 @@
 #include <fmt/format.h>
 
 #include "bench/CacheModel.h"
+#include "bench/PlainClient.h"
 #include "bench/Support.h"
 #include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVReply.h"
@@ -38,14 +39,6 @@ TAVAnswer search(TAVClient& client, std::int64_t queryId, const std::string& tex
     auto answer = client.request(*request);
     require(answer && answer->reply && answer->reply->rawResponse, "no answer to \"" + text + "\"");
     return std::move(*answer);
-}
-
-/// Seconds that `call` takes.
-template <class Call> double timeOf(Call call)
-{
-    const double begin = now();
-    call();
-    return now() - begin;
 }
 
 std::string percentiles(const std::vector<double>& latencies)
@@ -118,8 +111,10 @@ std::vector<Row> typing()
     const auto queries = replay::parseCorpus(corpus.view()).value();
     test::CacheModel model;
     std::vector<double> hits, requests;
+    std::vector<std::string> urls;
     int expectedHits = 0, differences = 0;
     std::int64_t queryId = 0;
+    const double begin = cpu(daemon.pid());
     for (std::size_t i = 0; i < queries.size(); ++i) {
         std::fprintf(stderr, "\rthe typing corpus: query %zu of %zu ", i + 1, queries.size());
         for (const auto& key : queries[i].keys) {
@@ -137,6 +132,7 @@ std::vector<Row> typing()
                 continue;
             }
             requests.push_back(latency);
+            urls.push_back(answer.reply->httpRequest->url);
             differences += expected ? 1 : 0;
             const Value sets = platform::parseJson(text).value();
             for (const Value& set : *sets.asArray())
@@ -144,6 +140,11 @@ std::vector<Row> typing()
         }
     }
     std::fputc('\n', stderr);
+    const double ours = cpu(daemon.pid()) - begin;
+    PlainClient plain(*ready["ca"].asString());
+    const double plainBegin = cpu();
+    for (const std::string& url : urls) plain.request(url);
+    const double beside = cpu() - plainBegin;
 
     const auto count = [](std::size_t number) { return fmt::format("{}", number); };
     const auto searches = static_cast<double>(hits.size() + requests.size());
@@ -153,7 +154,9 @@ std::vector<Row> typing()
             {"its searches that the service is asked for; the others are saved", count(requests.size()),
              count(hits.size() + requests.size()), 100 * static_cast<double>(requests.size()) / searches, 50, "%"},
             {"its latencies at 50, 90 and 99 %, of hits beside requests", percentiles(hits), percentiles(requests),
-             percentile(hits, 50) / percentile(requests, 50), kReportedOnly, "×"}};
+             percentile(hits, 50) / percentile(requests, 50), kReportedOnly, "×"},
+            {"the daemon's CPU for a key of it, beside libcurl and simdjson making the requests that remain",
+             seconds(ours / searches), seconds(beside / searches), ours / beside, kReportedOnly, "×"}};
 }
 
 } // namespace tavrin::bench

@@ -36,6 +36,7 @@ int main(int argc, char** argv)
                        {"flush", flush},
                        {"growth", flushGrowth},
                        {"events", events},
+                       {"growth", growth},
                        {"million", millionEvents, true}};
 
     const std::span arguments(argv + 1, argv + argc);
