@@ -1,24 +1,35 @@
 #include "CoreTavrin/ResponseImages.h"
 
+#include <optional>
+#include <utility>
+
 #include "CoreTavrin/TAVBag.h"
 #include "platform/values/Dictionary.h"
 
 namespace tavrin {
 
 using platform::Dictionary;
+using platform::JsonView;
 using platform::Url;
 using platform::Value;
 
 namespace {
 
-/// An array or dictionary that is being searched, and the position of the search.
+/// An array or dictionary that is being searched, and the position of the search. Elements have no key.
 struct Level {
-    const Value::Array* array;
-    const Dictionary* dictionary;
+    std::vector<std::pair<std::string_view, JsonView>> entries;
+    bool hasKeys = false;
     std::size_t next = 0;
-
-    [[nodiscard]] std::size_t count() const { return array ? array->size() : dictionary->size(); }
 };
+
+std::optional<Level> levelOf(JsonView value)
+{
+    if (value.isDictionary()) return Level{.entries = value.entries(), .hasKeys = true};
+    if (!value.isArray()) return std::nullopt;
+    Level level;
+    for (const JsonView element : value.elements()) level.entries.emplace_back("", element);
+    return level;
+}
 
 } // namespace
 
@@ -32,42 +43,37 @@ const std::set<std::string_view>& imageRoleKeys()
     return keys;
 }
 
-void enumerateImagesInResponse(const Value& object, const std::function<void(const Value& image)>& callback,
+void enumerateImagesInResponse(JsonView object, const std::function<void(JsonView image)>& callback,
                                const std::set<std::string_view>& keys)
 {
     std::vector<Level> levels;
-    const auto enter = [&levels](const Value& value) {
-        if (value.count() > 0) levels.push_back({value.asArray(), value.asDictionary()});
+    const auto enter = [&levels](JsonView value) {
+        if (auto level = levelOf(value)) levels.push_back(std::move(*level));
     };
     enter(object);
     while (!levels.empty()) {
         Level& level = levels.back();
-        if (level.next == level.count()) {
+        if (level.next == level.entries.size()) {
             levels.pop_back();
             continue;
         }
-        const std::size_t index = level.next++;
-        if (level.array) {
-            enter((*level.array)[index]);
-            continue;
-        }
-        const auto& [key, value] = level.dictionary->begin()[static_cast<std::ptrdiff_t>(index)];
-        if (!keys.contains(key))
+        const auto [key, value] = level.entries[level.next++];
+        if (!level.hasKeys || !keys.contains(key))
             enter(value);
-        else if (value.asDictionary())
+        else if (value.isDictionary())
             callback(value);
-        else if (const Value::Array* images = value.asArray())
-            for (const Value& image : *images) callback(image);
+        else
+            for (const JsonView image : value.elements()) callback(image);
     }
 }
 
-Value::Array collectResponseImageIdentifiers(const Value& response)
+Value::Array collectResponseImageIdentifiers(JsonView response)
 {
     Value::Array identifiers;
-    enumerateImagesInResponse(response, [&](const Value& image) {
+    enumerateImagesInResponse(response, [&](JsonView image) {
         Dictionary identifier;
         for (const char* key : {"url", "id"})
-            if (image[key].asString()) identifier.set(key, image[key]);
+            if (const auto text = image[key].asString()) identifier.set(key, *text);
         if (!identifier.empty()) identifiers.emplace_back(std::move(identifier));
     });
     return identifiers;

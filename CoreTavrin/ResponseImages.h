@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "platform/net/Url.h"
+#include "platform/values/Json.h"
 #include "platform/values/Value.h"
 
 /// Finds the images that an answer of the service refers to. The daemon prefetches them, and clients request them. Pure
@@ -24,13 +25,12 @@ class TAVBag;
 /// Calls back for each image description in `object`, in document order. A dictionary under one of `keys` is a
 /// description. So is each element, of any type, of an array under one of `keys`. Descriptions are not searched
 /// further. Other values under `keys` are ignored, and values under other keys are searched.
-void enumerateImagesInResponse(const platform::Value& object,
-                               const std::function<void(const platform::Value& image)>& callback,
+void enumerateImagesInResponse(platform::JsonView object, const std::function<void(platform::JsonView image)>& callback,
                                const std::set<std::string_view>& keys = imageRoleKeys());
 
 /// Returns the "url" and "id" of each image in the answer that has one of them, in document order.
 /// `TAVEndpointXPC::loadImages` accepts the result.
-[[nodiscard]] platform::Value::Array collectResponseImageIdentifiers(const platform::Value& response);
+[[nodiscard]] platform::Value::Array collectResponseImageIdentifiers(platform::JsonView response);
 
 /// URLs of images, in the order in which to fetch them.
 struct OrderedImages {

@@ -31,24 +31,26 @@ std::size_t imagesIn(const Value& object)
 /// all of hosts that are listed.
 void runInput(std::string_view input)
 {
-    const auto response = platform::parseJson(input);
-    if (!response) return;
+    const auto document = platform::JsonDocument::parse(input);
+    if (!document) return;
+    const platform::JsonView response = document->root();
     static const tavrin::TAVBag bag(Value::dictionaryOf({{"imageURL", "https://images.example/{id}?size=1"}}),
                                     "Fuzz/1");
 
     std::size_t count = 0;
     std::set<std::string> seen;
     tavrin::OrderedImages images, unseen;
-    tavrin::enumerateImagesInResponse(*response, [&](const Value& image) {
+    tavrin::enumerateImagesInResponse(response, [&](platform::JsonView view) {
+        const Value image = view.value();
         ++count;
         tavrin::collectOrderedImages(bag, image, &seen, images);
         tavrin::collectOrderedImages(bag, image, nullptr, unseen);
     });
-    check(count == imagesIn(*response));
+    check(count == imagesIn(response.value()));
     check(seen.size() == images.primary.size() + images.secondary.size());
     check(unseen.primary.size() + unseen.secondary.size() <= 2 * count);
     check(unseen.hosts == images.hosts);
     for (const auto* list : {&images.primary, &images.secondary})
         for (const platform::Url& url : *list) check(seen.contains(url.string()) && images.hosts.contains(url.host()));
-    check(tavrin::collectResponseImageIdentifiers(*response).size() <= count);
+    check(tavrin::collectResponseImageIdentifiers(response).size() <= count);
 }

@@ -19,6 +19,7 @@
 namespace tavrin {
 
 using platform::JsonDocument;
+using platform::JsonView;
 using platform::Value;
 
 namespace {
@@ -38,10 +39,13 @@ std::optional<JsonDocument> parsed(std::string_view json)
 std::optional<JsonDocument> innerList(std::string_view whitelist)
 {
     const auto outer = parsed(whitelist);
-    if (!outer || outer->textOf("compression") != "RLE" || outer->textOf("encoding") != "bitmap") return std::nullopt;
-    const auto text = outer->textOf("apps");
-    auto inner = text ? parsed(*text) : std::nullopt;
-    if (!inner || !inner->textOf("version") || !inner->hasDictionary("apps")) return std::nullopt;
+    if (!outer) return std::nullopt;
+    const JsonView resource = outer->root();
+    const auto text = resource["apps"].asString();
+    if (resource["compression"].asString() != "RLE" || resource["encoding"].asString() != "bitmap" || !text)
+        return std::nullopt;
+    auto inner = parsed(*text);
+    if (!inner || !inner->root()["version"].asString() || !inner->root()["apps"].isDictionary()) return std::nullopt;
     return inner;
 }
 
@@ -72,18 +76,17 @@ std::optional<std::string> processWhitelist(std::string_view whitelist, platform
     found.reserve(applications.size());
     for (const platform::InstalledApplication& application : applications)
         if (!application.identifier.empty() && !application.version.empty()) found.try_emplace(application.identifier);
-    list->eachEntryOf(
-        "apps", [&](std::string_view identifier) { return found.contains(identifier); },
-        [&](std::string_view identifier, const Value& entries) {
-            found.find(identifier)->second = encodingId(identifier, entries);
-        });
+    list->root()["apps"].eachEntry([&](std::string_view identifier, JsonView entries) {
+        const auto application = found.find(identifier);
+        if (application != found.end()) application->second = encodingId(identifier, entries.value());
+    });
     std::vector<std::uint32_t> ids;
     for (const auto& [identifier, id] : found)
         if (id) ids.push_back(*id);
     if (ids.empty()) return std::nullopt;
     std::ranges::sort(ids);
     const std::string bitmap = bitmapOf(ids);
-    const std::string_view version = *list->textOf("version");
+    const std::string_view version = *list->root()["version"].asString();
     auto signature = makeSignature(static_cast<std::uint16_t>(bitmap.size()), rle_compress(bitmap), version);
     if (!signature) log(kLogGeneral).error("app whitelist version is not hexadecimal: {}", version);
     return signature;

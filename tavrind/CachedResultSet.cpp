@@ -13,27 +13,28 @@ namespace tavrin {
 namespace {
 
 using platform::Date;
+using platform::JsonView;
 using platform::Value;
 
-std::optional<Date> expireTimeOf(const Value& resultSet, Date now)
+std::optional<Date> expireTimeOf(JsonView resultSet, Date now)
 {
     constexpr double kLongest = 1e9; // seconds, about 30 years: keeps the sum within the range of a Date
-    const double maxAge = resultSet["max_age"].asDouble().value_or(0);
+    const double maxAge = resultSet["max_age"].value().asDouble().value_or(0);
     if (maxAge == 0) return std::nullopt;
     return now + platform::durationFromSeconds(std::clamp(maxAge, -kLongest, kLongest));
 }
 
 /// Returns the text of a reply with this set alone. It is stored, so it has no spare capacity.
-platform::Bytes answerWith(const Value& resultSet)
+platform::Bytes answerWith(JsonView resultSet)
 {
-    std::string text = platform::toJson(Value::Array{resultSet});
+    std::string text = '[' + resultSet.json() + ']';
     text.shrink_to_fit();
     return platform::Bytes(std::move(text));
 }
 
-std::string queryOf(const Value& resultSet)
+std::string queryOf(JsonView resultSet)
 {
-    const std::string* query = resultSet["query"].asString();
+    const auto query = resultSet["query"].asString();
     return query ? platform::lowerCased(*query) : "";
 }
 
@@ -46,11 +47,11 @@ float uiScaleOf(const platform::UrlRequest& request)
 } // namespace
 
 CachedResultSet::CachedResultSet(std::string_view input_, std::shared_ptr<const platform::UrlRequest> request_,
-                                 const Value& resultSet, std::string uuid_, Date now)
+                                 JsonView resultSet, std::string uuid_, Date now)
     : input(platform::lowerCased(input_)), request(std::move(request_)), answer(answerWith(resultSet)),
       uuid(std::move(uuid_)), expireTime(expireTimeOf(resultSet, now)), query(queryOf(resultSet)),
       inputLength(platform::utf16Length(input)), queryLength(platform::utf16Length(query)),
-      completionScore(static_cast<float>(resultSet["completion_score"].asDouble().value_or(0))),
+      completionScore(static_cast<float>(resultSet["completion_score"].value().asDouble().value_or(0))),
       uiScale(uiScaleOf(*request))
 {}
 

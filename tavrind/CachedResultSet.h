@@ -9,6 +9,7 @@
 #include "platform/base/Bytes.h"
 #include "platform/base/Uuid.h"
 #include "platform/net/UrlSession.h"
+#include "platform/values/Json.h"
 #include "platform/values/Value.h"
 
 namespace tavrin {
@@ -19,7 +20,7 @@ struct CachedResultSet : std::enable_shared_from_this<CachedResultSet> {
     /// `input` is what the user had typed, `resultSet` an element of the answer to `request`, `uuid` that of the
     /// request's start record. The set expires "max_age" seconds after `now`; without "max_age", or with 0, never.
     CachedResultSet(std::string_view input, std::shared_ptr<const platform::UrlRequest> request,
-                    const platform::Value& resultSet, std::string uuid, platform::Date now);
+                    platform::JsonView resultSet, std::string uuid, platform::Date now);
 
     const std::string input; ///< in lower case
     const std::shared_ptr<const platform::UrlRequest> request;

@@ -142,10 +142,10 @@ void ClientStateManager::loadImages(Value::Array images, std::uint64_t timeout, 
     _imageLoader->loadImages(std::move(images), timeout, std::move(reply));
 }
 
-void ClientStateManager::processImagesFromResponse(const Value& response, const std::shared_ptr<const TAVBag>& bag,
-                                                   platform::UrlSource source)
+void ClientStateManager::processImagesFromResponse(std::shared_ptr<const platform::JsonDocument> response,
+                                                   std::shared_ptr<const TAVBag> bag, platform::UrlSource source)
 {
-    _imageLoader->processImagesFromResponse(response, bag, source);
+    _imageLoader->processImagesFromResponse(std::move(response), std::move(bag), source);
 }
 
 std::set<std::string> ClientStateManager::validImageHosts() const

@@ -8,8 +8,9 @@
 #include "CoreTavrin/TAVProtocols.h"
 
 namespace platform {
+class JsonDocument;
 class Queue;
-}
+} // namespace platform
 
 namespace platform {
 struct UrlSource;
@@ -44,8 +45,8 @@ public:
     void saveState();
 
     // Forwarded to the image loader.
-    void processImagesFromResponse(const platform::Value& response, const std::shared_ptr<const TAVBag>& bag,
-                                   platform::UrlSource source);
+    void processImagesFromResponse(std::shared_ptr<const platform::JsonDocument> response,
+                                   std::shared_ptr<const TAVBag> bag, platform::UrlSource source);
     [[nodiscard]] std::set<std::string> validImageHosts() const;
     void loadImages(platform::Value::Array images, std::uint64_t timeout,
                     platform::Reply<platform::Value> reply) override;

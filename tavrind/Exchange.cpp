@@ -1,5 +1,6 @@
 #include "tavrind/Exchange.h"
 
+#include <algorithm>
 #include <functional>
 
 #include <fmt/format.h>
@@ -37,6 +38,7 @@ namespace tavrin {
 using platform::Bytes;
 using platform::Error;
 using platform::JsonDocument;
+using platform::JsonView;
 using platform::Private;
 using platform::UrlRequest;
 using platform::UrlResponse;
@@ -248,7 +250,7 @@ void Exchange::_completed(std::optional<Bytes> data, std::optional<UrlResponse> 
     const platform::UrlSource source = platform::sourceOf(*response);
     if (cached)
         _client->queryCache()->setMade(
-            [self = shared_from_this(), document, source] { return self->_useAnswer(*document, source, true); },
+            [self = shared_from_this(), document, source] { return self->_useAnswer(document, source, true); },
             _cacheGeneration);
 
     auto reply = std::make_shared<TAVReply>();
@@ -263,7 +265,7 @@ void Exchange::_completed(std::optional<Bytes> data, std::optional<UrlResponse> 
 
     if (document && !cached)
         _assembly.device.globalQueue(platform::Priority::Default)->async([self = shared_from_this(), document, source] {
-            (void)self->_useAnswer(*document, source, false);
+            (void)self->_useAnswer(document, source, false);
         });
     endNetworkFeedback(document.get(), responseSize, statusCode, timingData);
     _forceFetch(*response);
@@ -272,27 +274,24 @@ void Exchange::_completed(std::optional<Bytes> data, std::optional<UrlResponse> 
 /// Returns true if the answer may be cached: it must have a result set with a "query".
 bool Exchange::_mayCache(const JsonDocument& answer) const
 {
-    return _kind.isSearch && _client->queryCache() && !_request->queryString.empty() && answer.anyElementHas("query");
+    return _kind.isSearch && _client->queryCache() && !_request->queryString.empty() &&
+           std::ranges::any_of(answer.root().elements(), [](JsonView set) { return set.has("query"); });
 }
 
 /// Starts the prefetch of the answer's images, and returns the result sets to cache. Runs on the cache's queue, or on a
 /// global queue if nothing is to be cached.
-std::vector<std::shared_ptr<const CachedResultSet>> Exchange::_useAnswer(const JsonDocument& document,
-                                                                         platform::UrlSource source, bool cached)
+std::vector<std::shared_ptr<const CachedResultSet>>
+Exchange::_useAnswer(const std::shared_ptr<const JsonDocument>& document, platform::UrlSource source, bool cached)
 {
-    const bool preload = !_view.configuration || !_view.configuration->dontPreloadImages;
-    if (!preload && !cached) return {};
-    const Value response = document.value();
-    if (preload) _assembly.clientStateManager->processImagesFromResponse(response, _view.bag, source);
+    if (!_view.configuration || !_view.configuration->dontPreloadImages)
+        _assembly.clientStateManager->processImagesFromResponse(document, _view.bag, source);
     if (!cached) return {};
 
     std::vector<std::shared_ptr<const CachedResultSet>> sets;
     const auto request = std::make_shared<const UrlRequest>(_httpRequest);
     const platform::Date now = _assembly.device.clock.wallNow();
-    for (const Value& set : *response.asArray()) {
-        if (!set.asDictionary()) continue;
-        const std::string* status = set["status"].asString();
-        if (status && *status == "ERROR") continue;
+    for (const JsonView set : document->root().elements()) {
+        if (!set.isDictionary() || set["status"].asString() == "ERROR") continue;
         sets.push_back(std::make_shared<const CachedResultSet>(_request->queryString, request, set,
                                                                _start->uuid.value_or(""), now));
     }
@@ -344,8 +343,8 @@ void Exchange::endNetworkFeedback(const JsonDocument* rawResponse, std::size_t r
                                   const Value& timingData)
 {
     std::shared_ptr<ZRFeedback> record;
-    if (rawResponse && rawResponse->count() > 0) {
-        const auto first = [rawResponse](std::string_view key) { return rawResponse->entryOfFirst(key); };
+    if (const auto sets = rawResponse ? rawResponse->root().elements() : std::vector<JsonView>(); !sets.empty()) {
+        const auto first = [&sets](std::string_view key) { return sets.front()[key].value(); };
         record = std::make_shared<TAVEndNetworkSearchFeedback>(
             _start, responseSize, statusCode, textIn(first("status")), first("duration").asDouble().value_or(0),
             textIn(first("fbq")), textIn(first("partial_client_ip")), timingData);

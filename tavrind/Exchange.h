@@ -52,7 +52,7 @@ private:
     void _answer(std::shared_ptr<TAVReply> record, OptionalError error);
     [[nodiscard]] bool _mayCache(const platform::JsonDocument& answer) const;
     [[nodiscard]] std::vector<std::shared_ptr<const CachedResultSet>>
-    _useAnswer(const platform::JsonDocument& document, platform::UrlSource source, bool cached);
+    _useAnswer(const std::shared_ptr<const platform::JsonDocument>& document, platform::UrlSource source, bool cached);
     void _forceFetch(const platform::UrlResponse& response);
 
     void _addFeedback(std::shared_ptr<ZRFeedback> record, std::uint64_t clientQueryId);

@@ -14,6 +14,7 @@
 #include "platform/run/Queue.h"
 #include "platform/run/Transactions.h"
 #include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 #include "searchrecords/ZRNetworkFeedback.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/ClientSessionManager.h"
@@ -28,6 +29,7 @@ namespace tavrin {
 
 using platform::Dictionary;
 using platform::Error;
+using platform::JsonView;
 using platform::Private;
 using platform::Url;
 using platform::UrlResponse;
@@ -84,18 +86,18 @@ void ImageLoader::_addImageHosts(const std::set<std::string>& hosts)
     }
 }
 
-void ImageLoader::processImagesFromResponse(const Value& response, const std::shared_ptr<const TAVBag>& bag,
-                                            platform::UrlSource source)
+void ImageLoader::processImagesFromResponse(std::shared_ptr<const platform::JsonDocument> response,
+                                            std::shared_ptr<const TAVBag> bag, platform::UrlSource source)
 {
     if (!bag) return;
-    _imageQueue->async([weak = weak_from_this(), response, bag, source] {
+    _imageQueue->async([weak = weak_from_this(), response = std::move(response), bag = std::move(bag), source] {
         const auto self = weak.lock();
         if (!self) return;
         self->_source = source;
         OrderedImages images;
         std::set<std::string> seen;
-        enumerateImagesInResponse(response,
-                                  [&](const Value& image) { collectOrderedImages(*bag, image, &seen, images); });
+        enumerateImagesInResponse(response->root(),
+                                  [&](JsonView image) { collectOrderedImages(*bag, image.value(), &seen, images); });
         if (images.hosts.empty()) return;
         self->_imageHostsQueue->barrierAsync([weak, hosts = std::move(images.hosts)] {
             if (const auto loader = weak.lock()) loader->_addImageHosts(hosts);

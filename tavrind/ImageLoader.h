@@ -13,6 +13,7 @@
 #include "tavrind/ImageFetches.h"
 
 namespace platform {
+class JsonDocument;
 class Queue;
 } // namespace platform
 
@@ -36,8 +37,8 @@ public:
 
     /// Starts the prefetch of an answer's images, asynchronously. Does nothing without a bag. `source` is the answer's
     /// origin: its image URLs may lead only where a redirect from there may.
-    void processImagesFromResponse(const platform::Value& response, const std::shared_ptr<const TAVBag>& bag,
-                                   platform::UrlSource source);
+    void processImagesFromResponse(std::shared_ptr<const platform::JsonDocument> response,
+                                   std::shared_ptr<const TAVBag> bag, platform::UrlSource source);
     /// Fetches images ({"url", "id"}), for `timeout` nanoseconds or a minute at most, and replies with the bytes of
     /// those that the cache then has, by "url" or else "id". A reply holds 16 MiB of images; further ones are left out.
     /// Clients name images of answers, so their URLs may lead only where a redirect from the last answer's origin may.

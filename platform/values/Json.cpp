@@ -2,11 +2,13 @@
 
 #include <algorithm>
 #include <array>
+#include <bit>
 #include <charconv>
 #include <clocale>
 #include <cmath>
 #include <cstdlib>
 #include <limits>
+#include <unordered_map>
 
 #include <fmt/format.h>
 #include <simdjson.h>
@@ -147,6 +149,30 @@ std::string mended(std::string_view text)
     return result;
 }
 
+/// Returns the entries as a Dictionary keeps them: the last of duplicate keys, at the place of the first.
+std::vector<dom::key_value_pair> entriesOf(dom::object object)
+{
+    constexpr std::size_t kFew = 16; // compared one by one
+    std::vector<dom::key_value_pair> entries;
+    entries.reserve(object.size());
+    std::unordered_map<std::string_view, std::size_t> places; // of many entries
+    if (object.size() > kFew) places.reserve(object.size());
+    for (const auto& entry : object) {
+        std::size_t place = entries.size();
+        if (object.size() > kFew) {
+            place = places.try_emplace(entry.key, place).first->second;
+        } else {
+            const auto same = std::ranges::find(entries, entry.key, &dom::key_value_pair::key);
+            place = static_cast<std::size_t>(same - entries.begin());
+        }
+        if (place == entries.size())
+            entries.push_back(entry);
+        else
+            entries[place].value = entry.value;
+    }
+    return entries;
+}
+
 Value convert(dom::element element);
 
 Value convertArray(dom::array array)
@@ -216,6 +242,27 @@ public:
         }
     }
 
+    void write(dom::element element)
+    {
+        switch (element.type()) {
+        case dom::element_type::ARRAY:
+            return writeContainer('[', ']', element.get_array().value_unsafe(),
+                                  [this](dom::element inner) { write(inner); });
+        case dom::element_type::OBJECT:
+            return writeContainer('{', '}', entriesOf(element.get_object().value_unsafe()),
+                                  [this](const dom::key_value_pair& entry) {
+                                      writeKey(entry.key);
+                                      write(entry.value);
+                                  });
+        case dom::element_type::INT64: return json::putNumber(_sink, element.get_int64().value_unsafe());
+        case dom::element_type::UINT64: return json::putNumber(_sink, element.get_uint64().value_unsafe());
+        case dom::element_type::DOUBLE: return json::putReal(_sink, element.get_double().value_unsafe());
+        case dom::element_type::STRING: return json::putString(_sink, element.get_string().value_unsafe());
+        case dom::element_type::BOOL: return _sink.put(element.get_bool().value_unsafe() ? "true" : "false");
+        case dom::element_type::NULL_VALUE: return _sink.put("null");
+        }
+    }
+
 private:
     void writeArray(const Value::Array& array)
     {
@@ -225,10 +272,15 @@ private:
     void writeDictionary(const Dictionary& dictionary)
     {
         writeContainer('{', '}', dictionary, [this](const Dictionary::Entry& entry) {
-            json::putString(_sink, entry.first);
-            _sink.put(_pretty ? std::string_view(": ") : std::string_view(":"));
+            writeKey(entry.first);
             write(entry.second);
         });
+    }
+
+    void writeKey(std::string_view key)
+    {
+        json::putString(_sink, key);
+        _sink.put(_pretty ? std::string_view(": ") : std::string_view(":"));
     }
 
     template <class Container, class WriteOne>
@@ -272,24 +324,6 @@ struct JsonDocument::Parsed {
     }
     Parsed(const Parsed&) = delete;
     Parsed& operator=(const Parsed&) = delete;
-
-    /// Returns nothing if the document is not an array.
-    [[nodiscard]] std::optional<dom::array> elements() const
-    {
-        dom::array array;
-        return root.get(array) == simdjson::SUCCESS ? std::optional(array) : std::nullopt;
-    }
-
-    /// Returns the last entry `wanted` of the document if it is a T; nothing otherwise.
-    template <class T> [[nodiscard]] std::optional<T> entry(std::string_view wanted) const
-    {
-        std::optional<dom::element> last;
-        if (dom::object object; root.get(object) == simdjson::SUCCESS)
-            for (const auto& [key, element] : object)
-                if (key == wanted) last = element;
-        T value;
-        return last && last->get(value) == simdjson::SUCCESS ? std::optional(value) : std::nullopt;
-    }
 };
 
 JsonDocument::JsonDocument(std::unique_ptr<Parsed> parsed) : _parsed(std::move(parsed)) {}
@@ -313,61 +347,99 @@ std::expected<JsonDocument, Error> JsonDocument::parse(std::string_view text, st
     return JsonDocument(std::move(parsed));
 }
 
-Value JsonDocument::value() const
+struct JsonView::Access {
+    static JsonView viewOf(dom::element element)
+    {
+        JsonView view;
+        view._place = std::bit_cast<decltype(view._place)>(element);
+        return view;
+    }
+    /// Returns what `view` refers to if it is a T.
+    template <class T> static std::optional<T> get(const JsonView& view)
+    {
+        T value;
+        const bool exists = view._place[0] != 0;
+        return exists && elementOf(view).get(value) == simdjson::SUCCESS ? std::optional(value) : std::nullopt;
+    }
+    static dom::element elementOf(const JsonView& view) { return std::bit_cast<dom::element>(view._place); }
+};
+
+JsonView JsonDocument::root() const
 {
-    return convert(_parsed->root);
+    return JsonView::Access::viewOf(_parsed->root);
 }
 
-std::size_t JsonDocument::count() const
+bool JsonView::isArray() const
 {
-    const auto elements = _parsed->elements();
-    return elements ? elements->size() : 0;
+    return Access::get<dom::array>(*this).has_value();
 }
 
-bool JsonDocument::anyElementHas(std::string_view key) const
+bool JsonView::isDictionary() const
 {
-    const auto elements = _parsed->elements();
-    return elements && std::ranges::any_of(*elements, [key](dom::element element) {
-               dom::object object;
-               return element.get(object) == simdjson::SUCCESS && !object.at_key(key).error();
-           });
+    return Access::get<dom::object>(*this).has_value();
 }
 
-std::optional<std::string_view> JsonDocument::textOf(std::string_view key) const
+std::optional<std::string_view> JsonView::asString() const
 {
-    return _parsed->entry<std::string_view>(key);
+    return Access::get<std::string_view>(*this);
 }
 
-bool JsonDocument::hasDictionary(std::string_view key) const
+JsonView JsonView::operator[](std::string_view key) const
 {
-    return _parsed->entry<dom::object>(key).has_value();
+    JsonView last;
+    if (const auto object = Access::get<dom::object>(*this))
+        for (const auto& [name, element] : *object)
+            if (name == key) last = Access::viewOf(element);
+    return last;
 }
 
-void JsonDocument::eachEntryOf(std::string_view key, const std::function<bool(std::string_view)>& wanted,
-                               const std::function<void(std::string_view, Value)>& take) const
+bool JsonView::has(std::string_view key) const
 {
-    const auto dictionary = _parsed->entry<dom::object>(key);
-    if (!dictionary) return;
-    for (const auto& [name, element] : *dictionary)
-        if (wanted(name)) take(name, convert(element));
+    return (*this)[key]._place[0] != 0;
 }
 
-Value JsonDocument::entryOfFirst(std::string_view key) const
+std::vector<JsonView> JsonView::elements() const
 {
-    const auto elements = _parsed->elements();
-    dom::object object;
-    if (!elements || elements->at(0).get(object) != simdjson::SUCCESS) return {};
-    std::optional<dom::element> last; // of duplicate keys
-    for (const auto& [name, element] : object)
-        if (name == key) last = element;
-    return last ? convert(*last) : Value();
+    std::vector<JsonView> elements;
+    if (const auto array = Access::get<dom::array>(*this)) {
+        elements.reserve(array->size());
+        for (const dom::element element : *array) elements.push_back(Access::viewOf(element));
+    }
+    return elements;
+}
+
+std::vector<std::pair<std::string_view, JsonView>> JsonView::entries() const
+{
+    std::vector<std::pair<std::string_view, JsonView>> entries;
+    if (const auto object = Access::get<dom::object>(*this))
+        for (const auto& [key, element] : entriesOf(*object)) entries.emplace_back(key, Access::viewOf(element));
+    return entries;
+}
+
+void JsonView::eachEntry(const std::function<void(std::string_view, JsonView)>& take) const
+{
+    if (const auto object = Access::get<dom::object>(*this))
+        for (const auto& [key, element] : *object) take(key, Access::viewOf(element));
+}
+
+Value JsonView::value() const
+{
+    return _place[0] != 0 ? convert(Access::elementOf(*this)) : Value();
+}
+
+std::string JsonView::json() const
+{
+    if (_place[0] == 0) return "null";
+    TextSink sink;
+    JsonWriter(sink, JsonStyle::Compact).write(Access::elementOf(*this));
+    return std::move(sink.text);
 }
 
 std::expected<Value, Error> parseJson(std::string_view text, std::size_t maximumSize)
 {
     auto document = JsonDocument::parse(text, maximumSize);
     if (!document) return std::unexpected(std::move(document.error()));
-    return document->value();
+    return document->root().value();
 }
 
 std::string toJson(const Value& value, JsonStyle style)

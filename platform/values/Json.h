@@ -1,12 +1,16 @@
 #pragma once
 
+#include <array>
 #include <cstddef>
+#include <cstdint>
 #include <expected>
 #include <functional>
 #include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
+#include <utility>
+#include <vector>
 
 #include "platform/values/Error.h"
 #include "platform/values/Value.h"
@@ -28,7 +32,40 @@ enum class JsonStyle { Compact, Pretty };
 /// Returns the length of `toJson(value)` in bytes without building the text.
 [[nodiscard]] std::size_t jsonSize(const Value& value);
 
-/// A parsed JSON document that builds values on demand: parsing takes a fifth of the time of building all values.
+/// A value inside a `JsonDocument`, which must outlive it. Null if what was asked for doesn't exist. Immutable: any
+/// thread.
+class JsonView {
+public:
+    JsonView() = default;
+
+    [[nodiscard]] bool isArray() const;
+    [[nodiscard]] bool isDictionary() const;
+    /// Returns the text, which the document owns, or nothing for a value of another type.
+    [[nodiscard]] std::optional<std::string_view> asString() const;
+    /// Returns the entry `key` of a dictionary, the last of duplicates; null if there is none.
+    [[nodiscard]] JsonView operator[](std::string_view key) const;
+    /// Returns true for a dictionary with an entry `key`, whose value may be null.
+    [[nodiscard]] bool has(std::string_view key) const;
+    /// Returns the elements of an array; nothing for a value of another type.
+    [[nodiscard]] std::vector<JsonView> elements() const;
+    /// Returns the entries of a dictionary, the last of duplicates at the place of the first, as `value` has them;
+    /// nothing for a value of another type.
+    [[nodiscard]] std::vector<std::pair<std::string_view, JsonView>> entries() const;
+    /// Calls `take` for each entry of a dictionary in the document's order, and once for each duplicate. Takes less
+    /// time than `entries`.
+    void eachEntry(const std::function<void(std::string_view key, JsonView entry)>& take) const;
+
+    [[nodiscard]] Value value() const;
+    /// Returns `toJson(value())` without building the value.
+    [[nodiscard]] std::string json() const;
+
+private:
+    friend class JsonDocument;
+    struct Access;
+    std::array<std::uintptr_t, 2> _place{}; ///< the parser's own reference; 0 for null
+};
+
+/// A parsed JSON document: parsing takes a fifth of the time of building all values.
 ///
 /// Owns a copy of what it needs: the text may be freed after parsing. Immutable: any thread.
 class JsonDocument {
@@ -41,28 +78,7 @@ public:
     JsonDocument& operator=(JsonDocument&&) noexcept;
     ~JsonDocument();
 
-    /// Returns the whole document as a value.
-    [[nodiscard]] Value value() const;
-
-    // For a document that is an array
-
-    /// Returns the number of elements; 0 if the document is not an array.
-    [[nodiscard]] std::size_t count() const;
-    /// Returns true if any element is a dictionary with an entry `key`.
-    [[nodiscard]] bool anyElementHas(std::string_view key) const;
-    /// Returns the entry `key` of the first element; null if that is not a dictionary or lacks the entry.
-    [[nodiscard]] Value entryOfFirst(std::string_view key) const;
-
-    // For a document that is a dictionary; the last of duplicate keys wins
-
-    /// Returns the text under `key`, or nothing for a value of another type. The document owns the text.
-    [[nodiscard]] std::optional<std::string_view> textOf(std::string_view key) const;
-    /// Returns true if the value under `key` is a dictionary.
-    [[nodiscard]] bool hasDictionary(std::string_view key) const;
-    /// Calls `take` for each entry of the dictionary under `key` for whose name `wanted` returns true, in the
-    /// document's order and once for each duplicate. Builds only these values.
-    void eachEntryOf(std::string_view key, const std::function<bool(std::string_view name)>& wanted,
-                     const std::function<void(std::string_view name, Value value)>& take) const;
+    [[nodiscard]] JsonView root() const;
 
 private:
     struct Parsed;

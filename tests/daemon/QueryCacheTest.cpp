@@ -22,7 +22,8 @@ std::shared_ptr<const CachedResultSet> makeSet(std::string_view input, Dictionar
 {
     auto request = std::make_shared<platform::UrlRequest>();
     if (scale > 0) request->headers.set("X-Quorvane-UI-Scale", fmt::format("{:.1f}", scale));
-    return std::make_shared<const CachedResultSet>(input, std::move(request), Value(std::move(resultSet)), "uuid", now);
+    const auto document = platform::JsonDocument::parse(platform::toJson(std::move(resultSet))).value();
+    return std::make_shared<const CachedResultSet>(input, std::move(request), document.root(), "uuid", now);
 }
 
 TEST(CachedResultSet, ReadsWhatItIsMadeFrom)

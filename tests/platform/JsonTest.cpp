@@ -2,6 +2,7 @@
 
 #include <limits>
 
+#include <fmt/format.h>
 #include <gtest/gtest.h>
 
 #include "platform/values/Dictionary.h"
@@ -106,57 +107,57 @@ TEST(Json, BoundsDepthAndSize)
     EXPECT_FALSE(parseJson("[100]", 4));
 }
 
-TEST(Json, DocumentsAnswerFromTheirPlace)
+TEST(Json, ViewsReadWhatTheValueHas)
 {
-    struct {
-        std::string_view text;
-        std::size_t count;
-        bool anyHasA;
-        Value firstA;
-    } const cases[] = {
-        {"[]", 0, false, nullptr},
-        {R"({"a":1})", 0, false, nullptr},
-        {R"("a")", 0, false, nullptr},
-        {R"([["a"],"a"])", 2, false, nullptr},
-        {R"([{"b":{"a":1}}])", 1, false, nullptr},
-        {R"([null,{"b":1,"a":2}])", 2, true, nullptr},
-        {R"([{"a":[1,{"b":0.5}]},{"a":3}])", 2, true, Value::Array{1, Dictionary{{"b", 0.5}}}},
-        {R"([{"a":1,"b":2,"a":3}])", 1, true, 3},
-    };
-    for (const auto& c : cases) {
-        std::string text(c.text);
-        const auto document = JsonDocument::parse(text);
-        ASSERT_TRUE(document) << c.text;
-        text.assign(text.size(), '!'); // it isn't needed any more
-        EXPECT_EQ(document->count(), c.count) << c.text;
-        EXPECT_EQ(document->anyElementHas("a"), c.anyHasA) << c.text;
-        EXPECT_EQ(document->entryOfFirst("a"), c.firstA) << c.text;
-        EXPECT_EQ(document->value(), parseJson(c.text).value()) << "another document at the same time";
+    const std::string many = [] { // more entries than are compared one by one, each twice
+        std::string text;
+        for (int i = 0; i < 60; ++i) text += fmt::format(R"({}"k{}":{})", i ? "," : "{", i % 30, i);
+        return text + "}";
+    }();
+    for (const std::string_view text :
+         {std::string_view("null"), std::string_view("[]"), std::string_view(R"("\u00fc\n\u0001\"")"),
+          std::string_view(R"([-1,18446744073709551615,0.5,-0.0,1e300,true,false,null,{},""])"),
+          std::string_view(R"({"a":1,"b":[2,{"c":"x"}],"a":{"d":3},"é":null})"), std::string_view(many)}) {
+        std::string copy(text);
+        const auto document = JsonDocument::parse(copy);
+        ASSERT_TRUE(document) << text;
+        copy.assign(copy.size(), '!');               // it isn't needed any more
+        const Value value = parseJson(text).value(); // another document at the same time
+        const JsonView root = document->root();
+        EXPECT_EQ(root.value(), value);
+        EXPECT_EQ(root.json(), toJson(value));
+        EXPECT_EQ(root.isArray(), value.asArray() != nullptr);
+        EXPECT_EQ(root.isDictionary(), value.asDictionary() != nullptr);
+        EXPECT_EQ(root.asString().has_value(), value.asString() != nullptr);
+        EXPECT_EQ(root.asString().value_or(""), value.asString() ? *value.asString() : "");
+        Value::Array elements;
+        for (const JsonView element : root.elements()) elements.push_back(element.value());
+        EXPECT_EQ(elements, value.asArray() ? *value.asArray() : Value::Array());
+        Dictionary entries;
+        for (const auto& [key, entry] : root.entries()) {
+            EXPECT_FALSE(entries.contains(key)) << key;
+            entries.set(std::string(key), entry.value());
+            EXPECT_EQ(root[key].value(), value[key]) << key;
+        }
+        EXPECT_EQ(Value(entries), value.asDictionary() ? value : Value(Dictionary()));
+        EXPECT_EQ(toJson(entries), value.asDictionary() ? toJson(value) : "{}") << "the order, too";
     }
 }
 
-TEST(Json, DocumentsThatAreDictionariesMakeOnlyTheValuesThatAreWanted)
+TEST(Json, ViewsOfNothingAreNull)
 {
-    const auto document = JsonDocument::parse(
-        R"({"t":"\u00fc","n":1,"d":{"x":1},"t":"last","d":{"a":[1],"b":2,"a":{"c":3},"":null},"l":["d"]})");
-    ASSERT_TRUE(document);
-    EXPECT_EQ(document->textOf("t"), "last");
-    for (const char* none : {"n", "d", "x", ""}) EXPECT_FALSE(document->textOf(none)) << none;
-    EXPECT_TRUE(document->hasDictionary("d"));
-    for (const char* none : {"t", "l", "a", ""}) EXPECT_FALSE(document->hasDictionary(none)) << none;
-
-    std::vector<std::string> asked, taken;
-    const auto each = [&](const JsonDocument& in, const char* key) {
-        in.eachEntryOf(
-            key, [&](std::string_view name) { return asked.emplace_back(name) != "b"; },
-            [&](std::string_view name, const Value& value) { taken.push_back(std::string(name) + toJson(value)); });
-    };
-    each(*document, "d");
-    EXPECT_EQ(asked, (std::vector<std::string>{"a", "b", "a", ""}));
-    EXPECT_EQ(taken, (std::vector<std::string>{"a[1]", "a{\"c\":3}", "null"}));
-    each(*document, "l");
-    each(*JsonDocument::parse(R"([{"d":{"a":1}}])"), "d");
-    EXPECT_EQ(taken.size(), 3u);
+    const auto document = JsonDocument::parse(R"({"n":null,"d":{"x":1,"x":2}})").value();
+    const JsonView root = document.root();
+    EXPECT_TRUE(root.has("n"));
+    for (const JsonView none : {root["x"], root["n"]["x"], JsonView()}) {
+        EXPECT_FALSE(none.has("x") || none.isArray() || none.isDictionary() || none.asString());
+        EXPECT_TRUE(none.value().isNull() && none.elements().empty() && none.entries().empty());
+        EXPECT_EQ(none.json(), "null");
+    }
+    std::string duplicates;
+    root["d"].eachEntry([&](std::string_view key, JsonView entry) { duplicates += std::string(key) + entry.json(); });
+    root["n"].eachEntry([&](std::string_view, JsonView) { duplicates += "!"; });
+    EXPECT_EQ(duplicates, "x1x2");
 }
 
 TEST(Json, KeepsNothingOfALargeDocumentForTheNextOne)

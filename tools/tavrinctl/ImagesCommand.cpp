@@ -7,6 +7,7 @@
 #include <fmt/format.h>
 
 #include "CoreTavrin/ResponseImages.h"
+#include "CoreTavrin/TAVReply.h"
 #include "CoreTavrin/TAVRequest.h"
 #include "platform/files/Files.h"
 #include "platform/values/Dictionary.h"
@@ -41,7 +42,9 @@ Value::Array wanted(const Options& options, const ImagesOptions& imagesOptions)
             imagesOptions.query);
         if (exchange.outcome() != Outcome::Answered)
             throw Failure("the search for the images failed: " + summary(exchange));
-        images = collectResponseImageIdentifiers(rawResponse(exchange));
+        if (const auto& text = exchange.answer->reply->rawResponse)
+            if (const auto document = platform::JsonDocument::parse(text->view()))
+                images = collectResponseImageIdentifiers(document->root());
         if (images.empty())
             throw Failure(fmt::format("the answer to \"{}\" has no images: try another query, or use --url or --id",
                                       imagesOptions.query));
