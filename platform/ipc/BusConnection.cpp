@@ -20,8 +20,8 @@ namespace {
 /// Steps in one go, before other connections have their turn. A message takes one or two.
 constexpr unsigned kStepsPerTurn = 64;
 
-/// Estimated bytes of sd-bus's own record of a message.
-constexpr std::size_t kMessageOverhead = 512;
+/// Estimated bytes of a message beside its text: sd-bus's record of it, the pending call and the queued task.
+constexpr std::size_t kMessageOverhead = 1536;
 
 /// A message of at most this size is accepted even at the limits, so that every connection can have one pending call.
 constexpr std::size_t kSmallMessage = 4u << 10;
