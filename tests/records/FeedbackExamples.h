@@ -9,8 +9,10 @@
 
 #include <gtest/gtest.h>
 
+#include "platform/values/Archive.h"
 #include "platform/values/Dictionary.h"
 #include "platform/values/Json.h"
+#include "platform/values/JsonSink.h"
 #include "platform/values/Record.h"
 #include "platform/values/ValueCoder.h"
 #include "tavrind/TavrinFeedback.h"
@@ -62,7 +64,13 @@ inline std::string eventFor(std::string_view recordJson)
 {
     TavrinFeedback event(feedbackFrom(recordJson), 12, "guid", "Example/1", 3);
     event.relTimestamp = 1500;
-    return platform::toJson(event.dictionary());
+    const std::string bytes = platform::archive(event);
+    platform::OpenArchive archive(tavrindRecordClasses());
+    platform::JsonTextSink text;
+    EXPECT_TRUE(archive.open(bytes));
+    TavrinFeedback::write(text, archive.root().as<TavrinFeedback>(), event.relTimestamp);
+    EXPECT_EQ(text.text(), platform::toJson(event.dictionary())) << "an upload and a reply have the same event";
+    return text.text();
 }
 
 } // namespace tavrin
