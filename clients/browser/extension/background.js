@@ -76,7 +76,6 @@ api.omnibox.onInputEntered.addListener(async (text, disposition) => {
 // Chromium also says that the input was cancelled just before it was entered.
 api.omnibox.onInputCancelled.addListener(() => {
   ++newest;
-  clearTimeout(leaving);
   leaving = setTimeout(() => host.tell({ do: "ended", how: "cancelled" }), 500);
 });
 
