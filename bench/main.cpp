@@ -34,7 +34,7 @@ int main(int argc, char** argv)
                        {"append", append},
                        {"archive", archive},
                        {"flush", flush},
-                       {"growth", flushGrowth},
+                       {"sizes", flushGrowth},
                        {"events", events},
                        {"growth", growth},
                        {"million", millionEvents, true}};
