@@ -56,9 +56,8 @@ std::optional<std::int32_t> sessionNumber(std::string_view fileName)
 }
 
 TavrinPersistentStorage::TavrinPersistentStorage(Assembly& assembly)
-    // Of default priority: the reply to an event waits for the event to be written.
-    : _assembly(assembly),
-      _queue(assembly.device.serialQueue("com.quorvane.tavrind.persistentStorageQueue", rank::kStore)),
+    : _assembly(assembly), _queue(assembly.device.serialQueue("com.quorvane.tavrind.persistentStorageQueue",
+                                                              rank::kStore, platform::Priority::Background)),
       _cachesUrl(assembly.device.directories.caches / "com.quorvane.tavrind"),
       _store(std::make_shared<FileContainerStore>(
           assembly.fileManager, assembly.device.transactions, assembly.diagnosticData, _queue,
