@@ -91,6 +91,7 @@ platform::Result<bool> StoredSession::add(std::string_view archive)
 std::vector<std::shared_ptr<TavrinFeedback>> StoredSession::feedbacks() const
 {
     std::vector<std::shared_ptr<TavrinFeedback>> feedbacks;
+    feedbacks.reserve(_events.size());
     for (const Event& event : _events)
         feedbacks.push_back(
             *platform::castRecord<TavrinFeedback>(platform::unarchive(event.archive, sessionFileClasses())));

@@ -448,7 +448,7 @@ TEST(Ipc, ConnectionsBeyondTheLimitWaitForTheirTurn)
     auto first = service.connect();
     const FileHandle second = rawConnection(service);
     service.settle();
-    EXPECT_EQ(service.connections.size(), 1u);
+    service.await([&] { return service.connections.size() == 1; });
     first.reset();
     service.await([&] { return service.connections.size() == 2; });
 }
