@@ -127,13 +127,10 @@ void TavrinPersistentStorage::_settle()
 
 void TavrinPersistentStorage::_settleSoon()
 {
-    _assembly.device.globalQueue(platform::Priority::Background)->async([self = shared_from_this()] {
-        const bool settled = self->_queue->sync([&] {
-            if (self->_unsettled.empty()) return false;
-            self->_settle();
-            return true;
-        });
-        if (settled) self->_settleSoon(); // a separate task lets waiting events be written in between
+    _queue->async([self = shared_from_this()] {
+        if (self->_unsettled.empty()) return;
+        self->_settle();
+        self->_settleSoon(); // a separate task lets waiting events be written in between
     });
 }
 
