@@ -44,7 +44,7 @@ public:
 
     /// Why reading failed.
     std::optional<CallError>& error() { return _error; }
-    /// The estimated memory of all values in bytes.
+    /// Returns the estimated memory of all values that were read, in bytes.
     [[nodiscard]] std::size_t size() const { return _size; }
     [[nodiscard]] std::vector<FileHandle> takeHandles() { return std::move(_handles); }
 

@@ -195,14 +195,6 @@ public:
         }
         _isRead = false;
         switch (token.type) {
-        case Value::Type::Null: return {};
-        case Value::Type::Bool: return token.boolean;
-        case Value::Type::Int: return token.integer;
-        case Value::Type::UInt: return token.unsignedInteger;
-        case Value::Type::Double: return token.real;
-        case Value::Type::String: return token.text();
-        case Value::Type::Bytes: return Bytes(std::string(token.text()));
-        case Value::Type::Date: return Date(Duration(token.integer));
         case Value::Type::Array: {
             Value::Array array;
             array.reserve(token.size);
@@ -218,8 +210,8 @@ public:
             }
             return dictionary;
         }
+        default: return archives::plainValue(token);
         }
-        return {};
     }
 
     void skip() override

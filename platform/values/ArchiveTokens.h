@@ -5,6 +5,7 @@
 #include <concepts>
 #include <cstdint>
 #include <cstring>
+#include <string>
 #include <string_view>
 #include <type_traits>
 
@@ -35,6 +36,24 @@ struct Token {
         return type == Value::Type::Array ? size : type == Value::Type::Dictionary ? std::uint64_t{size} * 2 : 0;
     }
 };
+
+/// Returns the value of a token; null for the head of a container.
+inline Value plainValue(const Token& token)
+{
+    switch (token.type) {
+    case Value::Type::Bool: return token.boolean;
+    case Value::Type::Int: return token.integer;
+    case Value::Type::UInt: return token.unsignedInteger;
+    case Value::Type::Double: return token.real;
+    case Value::Type::String: return token.text();
+    case Value::Type::Bytes: return platform::Bytes(std::string(token.text()));
+    case Value::Type::Date: return platform::Date(Duration(token.integer));
+    case Value::Type::Null:
+    case Value::Type::Array:
+    case Value::Type::Dictionary: break;
+    }
+    return {};
+}
 
 /// Reads a big-endian number.
 template <std::unsigned_integral Number> Number load(const char* from)

@@ -186,14 +186,6 @@ Value ArchivedValue::value() const
     if (!_archive) return {};
     const auto& [token, next] = _archive->_nodes[_node];
     switch (token.type) {
-    case Value::Type::Null: return {};
-    case Value::Type::Bool: return token.boolean;
-    case Value::Type::Int: return token.integer;
-    case Value::Type::UInt: return token.unsignedInteger;
-    case Value::Type::Double: return token.real;
-    case Value::Type::String: return token.text();
-    case Value::Type::Bytes: return Bytes(std::string(token.text()));
-    case Value::Type::Date: return Date(Duration(token.integer));
     case Value::Type::Array: {
         Value::Array array;
         array.reserve(token.size);
@@ -207,8 +199,8 @@ Value ArchivedValue::value() const
             [&](std::string_view key, ArchivedValue entry) { dictionary.set(std::string(key), entry.value()); });
         return dictionary;
     }
+    default: return archives::plainValue(token);
     }
-    return {};
 }
 
 bool ArchivedValue::hasDuplicateKeys() const

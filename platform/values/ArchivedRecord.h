@@ -89,7 +89,7 @@ private:
     std::uint32_t _node = 0;
 };
 
-/// An array in an archive. `T` is the type of its elements in the record.
+/// An array in an archive: what a field of type `std::vector<T>` holds.
 template <class T> class ArchivedArray {
 public:
     ArchivedArray() = default;

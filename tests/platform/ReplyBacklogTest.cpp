@@ -60,8 +60,8 @@ TEST(ReplyBacklog, NoHandlerIsCalledWhileLargeRepliesAreUnsent)
     auto client = service.connect();
     service.await([&] { return service.connections.size() == 1; });
     const auto connection = service.connections[0];
-    // A push that fails holds the lane: the first until both calls can be read, the second from the reply to the first
-    // call until no other worker is with the second one.
+    // While a push fails, the connection can't write a reply. The first push fails until both calls have been sent. The
+    // handler of the first call makes the second push, which fails until the other workers are idle.
     std::promise<void> written;
     service.onPushError = [&, calls = 0]() mutable {
         if (calls++ == 0) return written.get_future().wait();
