@@ -131,8 +131,9 @@ Row cachedSets()
     return growthRow("a cached search after 10² / 10³ / 10⁴ / 10⁵ answers that were cached", figures);
 }
 
-/// Makes one session file by ending a daemon without warning, and returns its path.
-fs::path writeSessionFile(const Service& service, const fs::path& caches)
+/// Moves a session file to `kept`, which a daemon left that was ended without warning, and removes its others. Returns
+/// their directory.
+fs::path keepSessionFile(const Service& service, const fs::path& caches, const fs::path& kept)
 {
     {
         const Daemon daemon(service.url("/bag"), {"XDG_CACHE_HOME=" + caches.string()});
@@ -144,10 +145,12 @@ fs::path writeSessionFile(const Service& service, const fs::path& caches)
             require(client->wait([&taken] { return taken; }, std::chrono::seconds(10)), "an event is not taken");
         }
     }
+    std::vector<fs::path> files;
     for (const auto& entry : fs::recursive_directory_iterator(caches))
-        if (entry.path().filename().string().starts_with("session.")) return entry.path();
-    require(false, "no session file");
-    return {};
+        if (entry.path().filename().string().starts_with("session.")) files.push_back(entry.path());
+    require(!files.empty(), "no session file");
+    for (const fs::path& file : files) fs::rename(file, kept); // the last one stays
+    return files.front().parent_path();
 }
 
 Row waitingFiles()
@@ -158,10 +161,9 @@ Row waitingFiles()
     for (const int count : {0, 40, 2000}) {
         const fs::path caches = home / fmt::format("caches{}", count);
         fs::create_directories(caches);
-        const fs::path file = writeSessionFile(service, caches);
         const fs::path kept = home / "kept";
-        fs::rename(file, kept);
-        for (int i = 1; i <= count; ++i) fs::copy_file(kept, file.parent_path() / fmt::format("session.{}", i));
+        const fs::path directory = keepSessionFile(service, caches, kept);
+        for (int i = 1; i <= count; ++i) fs::copy_file(kept, directory / fmt::format("session.{}", i));
         std::fprintf(stderr, "growth: start with %d session files\n", count);
         std::vector<double> starts;
         for (int i = 0; i < 21; ++i)
@@ -171,7 +173,6 @@ Row waitingFiles()
                 require(client && (*client)->sessions(), "the daemon doesn't answer");
             }));
         figures.push_back(median(std::move(starts)));
-        fs::remove(kept);
     }
     return growthRow("start to first answered call with 0 / 40 / 2,000 waiting session files", figures);
 }
