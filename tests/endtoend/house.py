@@ -19,6 +19,7 @@ TAVRIND = BUILD / "tavrind/tavrind"
 TAVRINCTL = BUILD / "tools/tavrinctl/tavrinctl"
 DEVSERVER = BUILD / "tools/devserver/tavrin-devserver"
 REPLAY = BUILD / "tools/replay/tavrin-replay"
+FILTERED = pathlib.Path(__file__).parent / "filtered"
 os.environ["no_proxy"] = "*"  # whatever proxy the environment has
 TIMEOUT = 60  # seconds for anything to happen, on a busy machine
 
@@ -67,6 +68,7 @@ class House:
         self.config = self.home / "config_home"
         self.log = Log()
         self.daemon = None
+        self.filtered = False  # True: a system call that the daemon's unit refuses ends it
         self.service = subprocess.Popen([DEVSERVER, "--http-port", "0", "--https-port", "0", "--cert-dir",
                                          self.home / "certificate", "--quiet"], stdout=subprocess.PIPE,
                                         stderr=subprocess.PIPE)
@@ -89,8 +91,9 @@ class House:
         """Holds the socket, as systemd's socket units do; the daemon starts with its first client."""
         self.socket().parent.mkdir(mode=0o700, exist_ok=True)
         passed_on = [f"-E{name}" for name in self.environment if re.match("XDG_|SSL_|TMPDIR|.*SAN_OPTIONS", name)]
+        program = [FILTERED, TAVRIND] if self.filtered else [TAVRIND]
         self.daemon = subprocess.Popen(["systemd-socket-activate", f"--listen={self.socket()}", *passed_on,
-                                        TAVRIND, "--check-queues", "--log-level", log_level],
+                                        *program, "--check-queues", "--log-level", log_level],
                                        env=self.environment, stderr=subprocess.PIPE)
         line = self.daemon.stderr.readline()
         check(b"istening" in line, f"systemd-socket-activate: {line}")
