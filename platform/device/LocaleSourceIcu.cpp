@@ -5,6 +5,7 @@
 #include <filesystem>
 #include <fstream>
 #include <optional>
+#include <utility>
 
 #include <unicode/calendar.h>
 #include <unicode/dtptngen.h>
@@ -108,6 +109,7 @@ std::optional<std::string> zoneOfPath(std::string_view path)
 
 constexpr const char* kLocaleFiles[] = {"locale.conf", "default/locale"};
 constexpr const char* kLocalTime = "localtime";
+constexpr const char* kTimeZone = "timezone"; // the name, where the above is a copy
 constexpr const char* kKeyboardFile = "default/keyboard";
 
 class SystemLocale final : public LocaleSource {
@@ -133,7 +135,7 @@ public:
         std::error_code failed;
         const std::string target = fs::read_symlink(_etc / kLocalTime, failed).string();
         if (const auto zone = zoneOfPath(target); zone && !failed) return *zone;
-        std::ifstream file(_etc / "timezone");
+        std::ifstream file(_etc / kTimeZone);
         std::string name;
         if (std::getline(file, name) && !name.empty()) return name;
         return "UTC";
@@ -182,8 +184,9 @@ private:
         _runLoop.execute(Priority::Default, [this] {
             for (const char* file : kLocaleFiles)
                 _watches.push_back(std::make_unique<FileWatch>(_runLoop, _etc / file, [this] { localeChanged(); }));
-            _watches.push_back(
-                std::make_unique<FileWatch>(_runLoop, _etc / kLocalTime, [this] { tell(Change::TimeZone); }));
+            _zone = timeZone();
+            for (const char* file : {kLocalTime, kTimeZone})
+                _watches.push_back(std::make_unique<FileWatch>(_runLoop, _etc / file, [this] { zoneChanged(); }));
         });
     }
 
@@ -197,6 +200,14 @@ private:
             _locale = std::move(fresh);
         }
         tell(Change::Locale);
+    }
+
+    void zoneChanged()
+    {
+        std::string fresh = timeZone();
+        if (fresh == _zone) return;
+        _zone = std::move(fresh);
+        tell(Change::TimeZone);
     }
 
     void tell(Change change)
@@ -215,7 +226,8 @@ private:
     std::optional<LocaleContext> _locale GUARDED_BY(_mutex);
     bool _filesChanged GUARDED_BY(_mutex) = false;
     std::function<void(Change)> _handler GUARDED_BY(_mutex);
-    std::vector<std::unique_ptr<FileWatch>> _watches; // loop's thread
+    std::vector<std::unique_ptr<FileWatch>> _watches; // loop's thread, like the next
+    std::string _zone;                                // last told
 };
 
 } // namespace

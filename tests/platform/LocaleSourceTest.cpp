@@ -128,6 +128,11 @@ TEST_F(SystemLocale, ChangesOfTheSystemAreToldOnceEach)
     fs::rename(etc / "new", etc / "localtime");
     EXPECT_TRUE(runUntil(loop, [&] { return zones == 1; }));
     EXPECT_EQ(source->timeZone(), "Europe/Zurich");
+    writeFile(etc / "timezone", "Asia/Tokyo\n"); // not asked, and no change
+    fs::remove(etc / "localtime");
+    EXPECT_TRUE(runUntil(loop, [&] { return zones == 2; }));
+    writeFile(etc / "timezone", "Asia/Seoul\n");
+    EXPECT_TRUE(runUntil(loop, [&] { return zones == 3; }));
 
     writeFile(etc / "locale.conf", "LANG=it_CH.UTF-8\nLANGUAGE=it:rm\n# the same\n");
     writeFile(etc / "unrelated", "LANG=ja_JP.UTF-8\n");
