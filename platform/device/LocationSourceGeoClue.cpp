@@ -18,6 +18,13 @@ constexpr std::uint32_t kAccuracyCity = 4;
 constexpr std::uint32_t kAccuracyStreet = 6;
 constexpr std::uint32_t kAccuracyExact = 8;
 
+/// Returns true if there is no bus, or nobody on it provides the service.
+bool isAbsence(const ipc::CallError& error)
+{
+    return error.name == "org.freedesktop.DBus.Error.Disconnected" ||
+           error.name == "org.freedesktop.DBus.Error.ServiceUnknown";
+}
+
 /// GeoClue doesn't report the source of a fix; this guesses it from the accuracy in metres.
 std::string sourceForAccuracy(double metres)
 {
@@ -42,7 +49,7 @@ public:
     }
     void requestUpdate() override
     {
-        // A running client reports every move, so only a failed start is repeated.
+        // A running client reports every move, so only a failed start is repeated, and not on a device without GeoClue.
         MutexLock lock(_mutex);
         if (!_wantsRestart) return;
         _wantsRestart = false;
@@ -78,7 +85,10 @@ private:
         _isAsking = false;
         if (_allowed.empty()) return;
         const std::string* path = result && !result->args.empty() ? result->args[0].asString() : nullptr;
-        if (!path) return lose(result ? "GeoClue gave no client" : result.error().message, true);
+        if (!path)
+            return lose(result ? "GeoClue gave no client" : result.error().message,
+                        _wasThere || result || !isAbsence(result.error()));
+        _wasThere = true;
         _client = {kGeoClue, *path, "org.freedesktop.GeoClue2.Client"};
         _updates = _bus.onSignal(*_client, "LocationUpdated", [this](const ipc::CallResult& places) {
             // The arguments are the old and the new location.
@@ -149,6 +159,7 @@ private:
         Handler handler;
         {
             MutexLock lock(_mutex);
+            if (location) _restarts = 0;
             if (location == _current) return;
             _current = location;
             handler = _handler;
@@ -156,14 +167,15 @@ private:
         if (handler) handler(location, reason);
     }
 
-    static constexpr int kMaximumRestarts = 3;
+    static constexpr int kMaximumRestarts = 3; // without a location in between
 
     RunLoop& _runLoop;
     const std::string _desktopId;
-    ipc::SystemBus _bus; // run loop's thread, like the next five
+    ipc::SystemBus _bus; // run loop's thread, like the next six
     ipc::SystemBus::Watch _updates;
     ipc::SystemBus::Watch _owner;
     bool _isAsking = false; // GetClient is pending
+    bool _wasThere = false; // GeoClue has provided a client
     std::set<std::string> _allowed;
     std::optional<ipc::SystemBus::Object> _client;
     Mutex _mutex;
