@@ -527,8 +527,11 @@ void TAVNetworkRequestFactory::guuidChangeNotification()
 
 void TAVNetworkRequestFactory::didUpdateStorefrontIdentifier(const std::optional<std::string>& storefront)
 {
-    _contextAccessQueue->barrierAsync(
-        [self = shared_from_this(), storefront] { self->_context.storeFrontIdentifier = storefront.value_or(""); });
+    _contextAccessQueue->barrierAsync([self = shared_from_this(), fresh = storefront.value_or("")] {
+        // The storefront comes later than the other settings: an answer in between is for the former one.
+        if (std::exchange(self->_context.storeFrontIdentifier, fresh) != fresh)
+            self->_post(TAVEffectiveSettingsChangeNotification);
+    });
 }
 
 void TAVNetworkRequestFactory::didUpdateSubscriptionDictionaries(const std::vector<Value>& subscriptions)
