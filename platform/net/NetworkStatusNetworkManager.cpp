@@ -65,7 +65,11 @@ private:
                 const Value* value = properties->find(name);
                 return static_cast<std::uint32_t>(value ? value->asUInt().value_or(0) : 0);
             };
-            set(networkStateOf(number("State"), number("Metered")));
+            const NetworkState state = networkStateOf(number("State"), number("Metered"));
+            if (current() != state)
+                defaultLog().info("the network is {}, {}", state.online ? "online" : "offline",
+                                  state.metered ? "metered" : "unmetered");
+            set(state);
         });
     }
 
