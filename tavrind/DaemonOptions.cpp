@@ -28,6 +28,9 @@ DaemonOptions parseDaemonOptions(int argc, char** argv)
         ->check(CLI::IsMember({"stderr", "journal"}));
     app.add_flag("--check-queues", options.checkQueues,
                  "Abort with an explanation if queues may wait for each other (for development)");
+    app.add_option("--etc", options.etc, "Where locale, time zone and keyboard are read (for development)")
+        ->check(CLI::ExistingDirectory)
+        ->capture_default_str();
     try {
         app.parse(argc, argv);
     } catch (const CLI::ParseError& error) {

@@ -1,5 +1,7 @@
 #pragma once
 
+#include <string>
+
 #include "platform/base/Log.h"
 
 namespace tavrin {
@@ -8,6 +10,7 @@ struct DaemonOptions {
     bool logToJournal = false;
     platform::LogLevel logLevel = platform::LogLevel::Default;
     bool checkQueues = false;
+    std::string etc = "/etc";
 };
 
 /// Parses the command line. For --help, --version and invalid options, prints a text and ends the process.

@@ -29,7 +29,8 @@ int main(int argc, char** argv)
     platform::SystemDevice device(runLoop, {.service = "com.quorvane.tavrind",
                                             .sharedSuite = "com.quorvane.lookup.shared",
                                             .objectPath = std::string(tavrin::kObjectPath),
-                                            .notifyInterface = "com.quorvane.Notify"});
+                                            .notifyInterface = "com.quorvane.Notify",
+                                            .etc = options.etc});
 
     auto daemon = tavrin::startUp(device.device());
     if (!daemon) {

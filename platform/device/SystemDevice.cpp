@@ -76,7 +76,7 @@ struct SystemDevice::Impl {
           userDefaults(*files, directories.config / (names.service + ".json"), storeQueue),
           lookupDefaults(*files, directories.config / (names.sharedSuite + ".json"), storeQueue),
           counters(*files, directories.state / names.service / "counters.json", storeQueue),
-          locale(makeLocaleSource(runLoop)), location(makeGeoClueLocationSource(runLoop, names.service)),
+          locale(makeLocaleSource(runLoop, names.etc)), location(makeGeoClueLocationSource(runLoop, names.service)),
           profile(makeDeviceProfileSource(*files, directories.config / names.service / "device.json", runLoop)),
           applications(makeInstalledApplications(*files, dataDirectories(directories), runLoop, pool, *clock)),
           subscriptions(makeSubscriptionServices(*files, directories.config / names.service / "subscriptions.d",

@@ -8,12 +8,13 @@ namespace platform {
 struct Device;
 class RunLoop;
 
-/// The product's names on the device.
+/// The names that the device is used by.
 struct DeviceNames {
     std::string service;         ///< name of files and directories in the user's directories: "com.example.service"
     std::string sharedSuite;     ///< name of the user defaults shared with clients
     std::string objectPath;      ///< path of the object that posts notify signals
     std::string notifyInterface; ///< the D-Bus interface of these signals
+    std::string etc = "/etc";    ///< where locale, time zone and keyboard are read
 };
 
 /// The real device. Creating it reads the user defaults, the counters and the directory of sockets; other parts connect
