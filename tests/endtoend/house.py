@@ -67,7 +67,8 @@ class House:
         self.cache = self.home / "cache_home/com.quorvane.tavrind"
         self.config = self.home / "config_home"
         self.log = Log()
-        self.daemon = None
+        self.daemon, self.daemon_options = None, ["--check-queues"]
+        self.passed_on = "XDG_|SSL_|TMPDIR|.*SAN_OPTIONS"  # the daemon's part of the environment
         self.filtered = False  # True: a system call that the daemon's unit refuses ends it
         self.service = subprocess.Popen([DEVSERVER, "--http-port", "0", "--https-port", "0", "--cert-dir",
                                          self.home / "certificate", "--quiet"], stdout=subprocess.PIPE,
@@ -90,10 +91,10 @@ class House:
     def start_daemon(self, log_level="info"):
         """Holds the socket, as systemd's socket units do; the daemon starts with its first client."""
         self.socket().parent.mkdir(mode=0o700, exist_ok=True)
-        passed_on = [f"-E{name}" for name in self.environment if re.match("XDG_|SSL_|TMPDIR|.*SAN_OPTIONS", name)]
+        passed_on = [f"-E{name}" for name in self.environment if re.match(self.passed_on, name)]
         program = [FILTERED, TAVRIND] if self.filtered else [TAVRIND]
         self.daemon = subprocess.Popen(["systemd-socket-activate", f"--listen={self.socket()}", *passed_on,
-                                        *program, "--check-queues", "--log-level", log_level],
+                                        *program, "--log-level", log_level, *self.daemon_options],
                                        env=self.environment, stderr=subprocess.PIPE)
         line = self.daemon.stderr.readline()
         check(b"istening" in line, f"systemd-socket-activate: {line}")
