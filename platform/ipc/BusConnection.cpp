@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <malloc.h>
 #include <poll.h>
 #include <sys/epoll.h>
 #include <sys/socket.h>
@@ -19,6 +20,9 @@ namespace {
 
 /// Steps in one go, before other connections have their turn. A message takes one or two.
 constexpr unsigned kStepsPerTurn = 64;
+
+/// Bytes that the kernel keeps for a peer that doesn't read; it counts them twice. A usual reply, of 60 KB, fits.
+constexpr int kSocketBuffer = 128 << 10;
 
 /// Estimated bytes of a message beside its text: sd-bus's record of it, the pending call and the queued task.
 constexpr std::size_t kMessageOverhead = 1536;
@@ -147,6 +151,7 @@ void BusConnection::start()
     }
     if (result >= 0) result = sd_bus_start(bus);
     if (result < 0) return end(describe(result));
+    setsockopt(_fd, SOL_SOCKET, SO_SNDBUF, &kSocketBuffer, sizeof(kSocketBuffer)); // sd-bus takes 8 MiB where it may
 
     startTimer();
     _source = _context->pool.watch(_fd, _lane, [weak = weak_from_this()](std::uint32_t events) {
@@ -475,7 +480,7 @@ void BusConnection::send(sd_bus_message* message, std::size_t size)
         return;
     }
     settleWriteQueue(size + kMessageOverhead);
-    if (_unwritten.size() > 1 && _unwrittenBytes > _context->limits.queuedBytes) end("it doesn't read");
+    if (_unwritten.size() > 1 && _unwrittenBytes > _context->limits.queuedBytes) endUnread("it doesn't read");
 }
 
 /// Updates the count of unwritten bytes from sd-bus's write queue. Each new message there counts as `sizeOfNewest`.
@@ -557,6 +562,14 @@ void BusConnection::end(std::string_view reason)
     close();
 }
 
+/// Ends the connection of a peer that reads no replies. Its calls that wait for the handler are dropped, because they
+/// would make more of them.
+void BusConnection::endUnread(std::string_view reason)
+{
+    _silenced = true;
+    end(reason);
+}
+
 void BusConnection::close()
 {
     if (std::exchange(_state, State::Closed) == State::Closed) return;
@@ -587,7 +600,10 @@ void BusConnection::abandon()
 
 void BusConnection::drop()
 {
-    _lane->async([self = shared_from_this()] { self->end("it doesn't read, and memory is short"); });
+    _lane->async([self = shared_from_this()] {
+        self->endUnread("it doesn't read, and memory is short");
+        self->_lane->async([self] { malloc_trim(0); }); // after dispose: the heaps of the workers keep freed memory
+    });
 }
 
 } // namespace platform::ipc

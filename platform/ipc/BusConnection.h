@@ -98,6 +98,7 @@ private:
 
     // ending
     void end(std::string_view reason);
+    void endUnread(std::string_view reason);
     void close();
     void dispose();
     void startTimer();

@@ -35,7 +35,7 @@ using namespace std::chrono_literals;
 using namespace platform::ipc::test;
 using testing::HasSubstr;
 
-constexpr std::size_t kBeyondSocketBuffers = 20 << 20; // sd-bus asks for 8 MiB
+constexpr std::size_t kBeyondSocketBuffers = 20 << 20; // a client's sd-bus asks for 8 MiB
 
 /// A client of another make.
 struct ForeignBus {
@@ -246,6 +246,30 @@ TEST(Ipc, DeafPeerIsDroppedAndOthersGoOn)
     EXPECT_TRUE(call(*other, method("Count")));
     EXPECT_FALSE(deaf->wait([] { return false; }, kLong));
     EXPECT_FALSE(deaf->connected());
+}
+
+TEST(Ipc, WaitingCallsOfADeafPeerAreDroppedWithIt)
+{
+    Service service({.queuedBytes = 1 << 20});
+    std::promise<void> gate, given, ended;
+    service.beforeGiving = [&] {
+        given.set_value();
+        gate.get_future().wait();
+    };
+    service.onPushError = [&, told = false]() mutable {
+        if (!std::exchange(told, true)) ended.set_value();
+    };
+    auto deaf = service.connect();
+    deaf->call(probe().name, method("Give"), {{1}, {}}, {});
+    deaf->call(probe().name, method("Note"), {{"dropped"}, {}}, {});
+    given.get_future().wait();
+    service.await([&] { return service.connections.size() == 1; });
+    for (int i = 0; i < 3; ++i)
+        service.connections[0]->push("Told", {{std::string(kBeyondSocketBuffers, 'x'), Dictionary()}, {}});
+    service.connections[0]->push("Told", {{"", Dictionary()}, {}});
+    ended.get_future().wait();
+    gate.set_value();
+    service.await([&] { return service.notes == std::vector<std::string>{"<invalidated>"}; });
 }
 
 TEST(Ipc, WhatWaitsForAllPeersIsBoundedInSum)
