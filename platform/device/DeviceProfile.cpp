@@ -20,12 +20,35 @@ constexpr std::size_t kMaximumProfileSize = 1u << 20;
 constexpr double kSmallestScale = 0.5;
 constexpr double kLargestScale = 8;
 
-std::optional<std::string> text(const Value& object, std::string_view key)
+/// Removes a member and returns it; null if it is missing.
+Value take(Dictionary& members, std::string_view key)
 {
-    const Value& value = object[key];
+    const Value* found = members.find(key);
+    Value value = found ? *found : Value();
+    members.remove(key);
+    return value;
+}
+
+/// Logs a member that is there and doesn't fit.
+void expect(bool fits, std::string_view key, const Value& value, std::string_view expected)
+{
+    if (!fits && !value.isNull()) defaultLog().error("device.json: {}: expected {}", key, expected);
+}
+
+std::optional<std::string> text(Dictionary& members, std::string_view key)
+{
+    const Value value = take(members, key);
     const std::string* string = value.asString();
-    if (!value.isNull() && !string) defaultLog().error("device.json: {}: expected a string", key);
+    expect(string, key, value, "a string");
     return string && !string->empty() ? std::optional(*string) : std::nullopt;
+}
+
+bool flag(Dictionary& members, std::string_view key)
+{
+    const Value value = take(members, key);
+    const auto truth = value.asBool();
+    expect(truth.has_value(), key, value, "true or false");
+    return truth.value_or(false);
 }
 
 class FileProfile final : public DeviceProfileSource {
@@ -95,20 +118,26 @@ private:
 DeviceProfile deviceProfileFromValue(const Value& value)
 {
     if (!value.asDictionary()) defaultLog().error("device.json: expected an object");
+    Dictionary members = value.asDictionary() ? *value.asDictionary() : Dictionary();
     DeviceProfile profile;
-    profile.countryCode = text(value, "countryCode");
-    profile.storefront = text(value, "storefront");
-    profile.managedAccount = value["managedAccount"].asBool().value_or(false);
-    profile.newsSubscribed = value["newsSubscribed"].asBool().value_or(false);
-    const double scale = value["screenScale"].asDouble().value_or(1.0);
-    if (scale >= kSmallestScale && scale <= kLargestScale)
-        profile.screenScale = scale;
-    else
-        defaultLog().error("device.json: screenScale: expected {} to {}", kSmallestScale, kLargestScale);
-    profile.geoMetadata = text(value, "geoMetadata");
-    profile.geoEnvironment = text(value, "geoEnvironment");
-    profile.geoSessionId = text(value["geoSession"], "id");
-    profile.geoSessionEntity = text(value["geoSession"], "entity");
+    profile.countryCode = text(members, "countryCode");
+    profile.storefront = text(members, "storefront");
+    profile.managedAccount = flag(members, "managedAccount");
+    profile.newsSubscribed = flag(members, "newsSubscribed");
+    const Value scale = take(members, "screenScale");
+    const double number = scale.asDouble().value_or(0);
+    const bool inRange = number >= kSmallestScale && number <= kLargestScale;
+    expect(inRange, "screenScale", scale, "a number from 0.5 to 8");
+    if (inRange) profile.screenScale = number;
+    profile.geoMetadata = text(members, "geoMetadata");
+    profile.geoEnvironment = text(members, "geoEnvironment");
+    const Value geoSession = take(members, "geoSession");
+    expect(geoSession.asDictionary(), "geoSession", geoSession, "an object");
+    Dictionary session = geoSession.asDictionary() ? *geoSession.asDictionary() : Dictionary();
+    profile.geoSessionId = text(session, "id");
+    profile.geoSessionEntity = text(session, "entity");
+    for (const Dictionary& unknown : {members, session})
+        for (const auto& [key, member] : unknown) defaultLog().error("device.json: {}: there is no such member", key);
     return profile;
 }
 

@@ -28,7 +28,7 @@ struct DeviceProfile {
     bool operator==(const DeviceProfile&) const = default;
 };
 
-/// Reads a profile. Members of the wrong type are logged and count as missing.
+/// Reads a profile. Members of the wrong type and unknown ones are logged, and count as missing.
 [[nodiscard]] DeviceProfile deviceProfileFromValue(const Value& value);
 
 /// Reports the profile and its changes. Any thread.

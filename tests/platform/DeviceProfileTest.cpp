@@ -34,18 +34,19 @@ TEST_F(DeviceProfileTest, MembersOfTheWrongTypeReadAsMissing)
         int complaints;
     } cases[]{
         {R"({"countryCode": "CH", "storefront": "143459", "managedAccount": true, "screenScale": 2.5, "geoMetadata": "m",
-             "geoEnvironment": "e", "geoSession": {"id": "i", "entity": "n"}, "other": 1})",
+             "geoEnvironment": "e", "geoSession": {"id": "i", "entity": "n"}, "newsSubscribed": false})",
          whole, 0},
         {"{}", {}, 0},
         {R"({"countryCode": "", "storefront": null})", {}, 0},
         {R"({"countryCode": 41, "storefront": ["x"], "geoMetadata": true, "geoSession": {"id": 1}})", {}, 4},
-        {R"({"geoSession": "x", "managedAccount": "true"})", {}, 0},
+        {R"({"geoSession": "x", "managedAccount": "true", "newsSubscribed": 1, "country": "CH"})", {}, 4},
+        {R"({"geoSession": {"id": "i", "identity": "n"}})", {.geoSessionId = "i"}, 1},
         {R"({"screenScale": 0.5})", {.screenScale = 0.5}, 0},
         {R"({"screenScale": 8})", {.screenScale = 8}, 0},
         {R"({"screenScale": 0.49})", {}, 1},
         {R"({"screenScale": 8.01})", {}, 1},
         {R"({"screenScale": -1e300})", {}, 1},
-        {R"({"screenScale": "2"})", {}, 0},
+        {R"({"screenScale": "2"})", {}, 1},
         {"[]", {}, 1},
         {"null", {}, 1},
     };
