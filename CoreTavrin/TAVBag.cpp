@@ -65,7 +65,7 @@ struct HttpUrl {
 };
 
 struct UrlTemplate {
-    static constexpr std::string_view kExpected = "a URL with {id} in it";
+    static constexpr std::string_view kExpected = "a URL with {id} or {query} in it";
     static std::optional<std::string> read(const Value& value)
     {
         const std::string* text = value.asString();
@@ -117,6 +117,7 @@ constexpr std::tuple kKeys{
     Key<HttpUrl>{"feedbackURL"},
     Key<HttpUrl>{"crowdsourcingURL"},
     Key<UrlTemplate>{"imageURL"},
+    Key<UrlTemplate>{"searchPageURL"}, // only clients read it
     Key<Switch>{"sendGeoEnvironmentHeader"},
     Key<Texts>{"supportedGeoLocationSources"},
     Key<Switch>{"hashtagImagesVisible"},

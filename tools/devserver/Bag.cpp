@@ -41,6 +41,7 @@ Value Bag::document() const
         {"feedbackURL", _base + "/feedback"},
         {"crowdsourcingURL", _base + "/crowdsourcing"},
         {"imageURL", _base + "/images/{id}"},
+        {"searchPageURL", _base + "/search?q={query}"},
         {"sendGeoEnvironmentHeader", false},
         {"supportedGeoLocationSources", Value::Array{"gps", "wifi", "cell"}},
         {"subscriptionProviderDomainWhitelist", Value::Array{"news.example", "films.example"}},
