@@ -70,6 +70,7 @@ class House:
         self.daemon, self.daemon_options = None, ["--check-queues"]
         self.passed_on = "XDG_|SSL_|TMPDIR|.*SAN_OPTIONS"  # the daemon's part of the environment
         self.filtered = False  # True: a system call that the daemon's unit refuses ends it
+        self.others = []  # processes that a case starts, and that end with the house
         self.service = subprocess.Popen([DEVSERVER, "--http-port", "0", "--https-port", "0", "--cert-dir",
                                          self.home / "certificate", "--quiet"], stdout=subprocess.PIPE,
                                         stderr=subprocess.PIPE)
@@ -179,7 +180,7 @@ class House:
         check(status == 0, f"the service ended with status {status}")
 
     def end(self):
-        for process in filter(None, (self.daemon, self.service)):
+        for process in filter(None, (self.daemon, self.service, *self.others)):
             process.kill()
             process.wait()
 
