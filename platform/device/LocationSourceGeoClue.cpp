@@ -17,6 +17,8 @@ constexpr const char* kGeoClue = "org.freedesktop.GeoClue2";
 constexpr std::uint32_t kAccuracyCity = 4;
 constexpr std::uint32_t kAccuracyStreet = 6;
 constexpr std::uint32_t kAccuracyExact = 8;
+/// Metres below which a move is not reported: a fifth of a cell of `fuzz`. A device at rest then wakes nobody.
+constexpr std::uint32_t kReportedMove = 200;
 
 /// Returns true if there is no bus, or nobody on it provides the service.
 bool isAbsence(const ipc::CallError& error)
@@ -100,6 +102,7 @@ private:
                          _allowed.contains("gps")    ? kAccuracyExact
                          : _allowed.contains("wifi") ? kAccuracyStreet
                                                      : kAccuracyCity);
+        _bus.setProperty(*_client, "DistanceThreshold", "u", kReportedMove);
         _bus.call(*_client, "Start", [this](const ipc::CallResult& started) {
             if (!started) forget(started.error().message);
         });

@@ -184,7 +184,8 @@ TEST_F(SystemBusTest, LogindSaysWhetherSomeoneIsAtTheScreen)
 /// A GeoClue with one client, which is at one place until it is moved.
 struct GeoClue {
     double latitude = 47.37, longitude = 8.54, accuracy = 20;
-    std::uint32_t wanted = 0; // the accuracy level of the client
+    std::uint32_t wanted = 0;    // the accuracy level of the client
+    std::uint32_t threshold = 0; // metres
     std::string desktopId;
     int started = 0, stopped = 0;
 
@@ -219,6 +220,8 @@ const sd_bus_vtable kGeoClueManager[]{
 const sd_bus_vtable kGeoClueClient[]{
     SD_BUS_VTABLE_START(0),
     SD_BUS_WRITABLE_PROPERTY("DesktopId", "s", getText, setText, offsetof(GeoClue, desktopId),
+                             SD_BUS_VTABLE_UNPRIVILEGED),
+    SD_BUS_WRITABLE_PROPERTY("DistanceThreshold", "u", nullptr, nullptr, offsetof(GeoClue, threshold),
                              SD_BUS_VTABLE_UNPRIVILEGED),
     SD_BUS_WRITABLE_PROPERTY("RequestedAccuracyLevel", "u", nullptr, nullptr, offsetof(GeoClue, wanted),
                              SD_BUS_VTABLE_UNPRIVILEGED),
@@ -283,6 +286,7 @@ TEST_F(SystemBusTest, GeoClueIsAskedAsExactlyAsIsAllowedAndAnewWhereThatChanges)
         EXPECT_EQ(geo.stopped, started++) << "the one before";
     }
     EXPECT_EQ(geo.desktopId, "com.example.service");
+    EXPECT_EQ(geo.threshold, 200u) << "every fix of a device at rest wakes the daemon";
     geo.accuracy = 300;
     geo.fix(service);
     EXPECT_TRUE(becomes(std::nullopt));
