@@ -2,6 +2,7 @@
 
 #include "CoreTavrin/TAVBag.h"
 #include "platform/values/PropertyList.h"
+#include "tavrind/ClientSessionManager.h"
 #include "tavrind/TAVNetworkRequestFactory.h"
 #include "tavrind/TavrinBagController.h"
 #include "tests/support/FeedbackFixture.h"
@@ -90,8 +91,7 @@ TEST_F(BagControllerTest, FetchesOnceKeepsItOnDiskAndRestartsFromThere)
     EXPECT_EQ(counter("bag.fetches"), 1);
     const auto raw = controller().currentBag()->rawBag();
     EXPECT_EQ(raw["__expiration"].asDouble(), platform::secondsSince1970(device.clock.wallNow()) + 14400);
-    EXPECT_TRUE(raw["__bagurl"].asString()->contains("agent=tavrind%2F0.1.0") ||
-                raw["__bagurl"].asString()->contains("agent=tavrind/0.1.0"));
+    EXPECT_TRUE(raw["__bagurl"].asString()->contains("agent=" + ClientSessionManager::tavrindUserAgent()));
     EXPECT_EQ(platform::parsePropertyList(device.files.files.at(kPath)), raw);
 
     start();

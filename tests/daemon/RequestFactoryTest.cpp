@@ -1,6 +1,7 @@
 #include "CoreTavrin/TAVRequest.h"
 #include "platform/values/Json.h"
 #include "tavrind/AppWhitelistController.h"
+#include "tavrind/ClientSessionManager.h"
 #include "tavrind/TAVNetworkRequestFactory.h"
 #include "tavrind/TavrinUserGUIDController.h"
 #include "tests/support/AssemblyFixture.h"
@@ -128,7 +129,7 @@ TEST_F(RequestFactoryTest, EveryKindCarriesItsColumnOfTheTable)
         {'u', factory->flusherUploadRequest(*Url::parse("https://u.example/up"), std::chrono::seconds(300), "abc")},
         {'w', factory->warmRequest(*Url::parse("https://s.example/warm"))},
     };
-    const std::pair<const char*, const char*> table[]{
+    const std::pair<std::string, const char*> table[]{
         {"debug=1", "baszmlcfu"},
         {"own=1", "szmlcf"},
         {"q=weat", "s"},
@@ -161,7 +162,7 @@ TEST_F(RequestFactoryTest, EveryKindCarriesItsColumnOfTheTable)
         {"User-Agent: Vistrel/4", "szmlcf"},
         {"User-Agent: tavrind/1", "b"},
         {"User-Agent: Vistrel/1", "d"},
-        {"User-Agent: tavrind/0.1.0", "u"},
+        {"User-Agent: " + ClientSessionManager::tavrindUserAgent(), "u"},
         {"X-Quorvane-UI-Scale: 2.0", "szmlcf"},
         {"X-Quorvane-GeoEnvironment: prod", "szc"},
         {"X-Quorvane-GeoSession: session-1", "szlcf"},

@@ -14,6 +14,7 @@ Options parseOptions(int argc, char** argv)
     options.certificateDirectory = platform::Directories::fromEnvironment().state / "tavrin-devserver";
     CLI::App app("A search service for development. It serves a built-in catalogue over HTTP and HTTPS, fails on "
                  "demand (POST /control/faults), and prints its addresses as one line of JSON once it listens.");
+    app.set_version_flag("--version", "tavrin-devserver " TAVRIND_VERSION);
     std::string directory = options.certificateDirectory;
     std::string readyFile;
     app.add_option("--address", options.address, "Address to listen on")->capture_default_str();

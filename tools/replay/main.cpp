@@ -62,7 +62,7 @@ public:
         : _options(options), _client(valueOf(TAVClient::connect(options.address), options.address))
     {
         _client->setTimeout(platform::durationFromSeconds(options.timeout));
-        TAVSessionConfiguration configuration(options.identifier, "tavrin-replay/1");
+        TAVSessionConfiguration configuration(options.identifier, "tavrin-replay/" TAVRIND_VERSION);
         configuration.dontPreloadImages = true; // the report is about searches
         (void)valueOf(_client->configure(configuration), "configure");
         for (int attempt = 0; attempt < 10 && !_bag; ++attempt) // each waits up to a second for the first bag
@@ -144,6 +144,7 @@ int main(int argc, char** argv)
     CLI::App app(
         "Types a corpus of queries into the daemon, key by key, and reports hits, requests saved, stale answers and "
         "latencies. The exit status is 1 if an answer was stale or failed.");
+    app.set_version_flag("--version", "tavrin-replay " TAVRIND_VERSION);
     app.add_option("corpus", options.corpus, "Corpus file in the form of tools/replay/corpus.txt")->required();
     app.add_option("--address", options.address, "The daemon's D-Bus address")->capture_default_str();
     app.add_option("--identifier", options.identifier, "Client identifier to connect as")->capture_default_str();
