@@ -245,10 +245,15 @@ std::optional<std::vector<std::string>> TAVBag::subscriptionProviderBundleIdenti
     return read(kKey<"subscriptionProviderBundleIdentifierWhitelist">);
 }
 
+std::optional<std::string> TAVBag::imageURL() const
+{
+    return read(kKey<"imageURL">);
+}
+
 std::optional<Url> TAVBag::urlForIdentifier(std::string_view identifier) const
 {
     static constexpr std::string_view kPlaceholder = "{id}";
-    auto text = read(kKey<"imageURL">);
+    auto text = imageURL();
     const std::size_t at = text ? text->find(kPlaceholder) : std::string::npos;
     if (at == std::string::npos) return std::nullopt;
     text->replace(at, kPlaceholder.size(), platform::percentEncodePathSegment(identifier));

@@ -43,7 +43,9 @@ public:
     [[nodiscard]] std::optional<platform::Url> flightURL() const;
     [[nodiscard]] std::optional<platform::Url> feedbackURL() const;
     [[nodiscard]] std::optional<platform::Url> crowdsourcingURL() const;
-    /// Returns the template "imageURL" with the percent-encoded identifier in place of "{id}"; nothing if "{id}" is
+    /// The template of an image's URL, with "{id}".
+    [[nodiscard]] std::optional<std::string> imageURL() const;
+    /// Returns that template with the percent-encoded identifier in place of "{id}"; nothing if "{id}" is
     /// missing.
     [[nodiscard]] std::optional<platform::Url> urlForIdentifier(std::string_view identifier) const;
     /// Returns the URL of the downloadable resource with this identifier.

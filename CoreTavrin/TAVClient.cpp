@@ -133,6 +133,9 @@ Result<std::unique_ptr<TAVFlusherClient>> TAVFlusherClient::connect(const std::s
                 listener.receivedFeedbackDescription(std::get<0>(*text));
         } else if (member == members::kWorkDone.name) {
             listener.workDone();
+        } else if (member == members::kReplaced.name) {
+            if (const auto by = members::kReplaced.arguments(std::move(message)))
+                listener.replaced(static_cast<FlusherIntent>(std::get<0>(*by)), std::get<1>(*by));
         }
     });
     return std::unique_ptr<TAVFlusherClient>(new TAVFlusherClient(std::move(*client), flusherInterface()));
@@ -224,6 +227,40 @@ Result<Value> TAVClient::status()
 Result<std::string> TAVClient::statistics()
 {
     return only(resultsOf(members::kStatistics, call(members::kStatistics, {})));
+}
+
+Result<Value> TAVClient::figures()
+{
+    return only(resultsOf(members::kFigures, call(members::kFigures, {})));
+}
+
+Result<Value> TAVClient::waiting()
+{
+    return only(resultsOf(members::kWaiting, call(members::kWaiting, {})));
+}
+
+Result<Value::Array> TAVClient::previewUploads()
+{
+    return only(resultsOf(members::kPreviewUploads, call(members::kPreviewUploads, {})));
+}
+
+Result<Value> TAVClient::previewRequest(const TAVRequest& request)
+{
+    constexpr auto& row = members::kPreviewRequest;
+    auto answer = resultsOf(row, call(row, row.call(request)));
+    if (!answer) return std::unexpected(std::move(answer.error()));
+    auto& [preview, error] = *answer;
+    if (error) return std::unexpected(std::move(*error));
+    return std::move(preview);
+}
+
+Result<void> TAVClient::wipe(bool settings)
+{
+    constexpr auto& row = members::kWipe;
+    const auto answer = call(row, row.call(settings));
+    if (answer || connected())
+        return std::unexpected(answer ? clientError(EPROTO, "the daemon did not start again") : answer.error());
+    return {};
 }
 
 void TAVClient::onBagDidLoad(std::function<void(TAVBagAnswer)> handler)

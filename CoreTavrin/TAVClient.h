@@ -152,6 +152,14 @@ public:
     platform::Result<platform::Value> status();
     /// Returns the daemon's counters as OpenMetrics text. Needs no configuration.
     platform::Result<std::string> statistics();
+    // Operations of `TAVDiagnosticsXPC`. They need no configuration, except a request's own for `previewRequest`.
+    platform::Result<platform::Value> figures();
+    platform::Result<platform::Value> waiting();
+    platform::Result<platform::Value::Array> previewUploads();
+    /// Returns an error in `TAVErrorDomain` if the daemon would not send the request.
+    platform::Result<platform::Value> previewRequest(const TAVRequest& request);
+    /// Returns after the daemon has closed this connection, which it does to start again without its traces.
+    platform::Result<void> wipe(bool settings);
 
     /// Sets the callback for bags that the daemon pushes; replaces the previous one.
     void onBagDidLoad(std::function<void(TAVBagAnswer)> handler);

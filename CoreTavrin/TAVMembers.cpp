@@ -81,6 +81,11 @@ template <> Result<std::string> Take<std::string>::from(ipc::Message& message, s
     return text ? *text : std::string();
 }
 
+template <> Result<bool> Take<bool>::from(ipc::Message& message, std::size_t index)
+{
+    return message.args[index].asBool().value_or(false);
+}
+
 template <> Result<std::int64_t> Take<std::int64_t>::from(ipc::Message& message, std::size_t index)
 {
     return message.args[index].asInt().value_or(0);

@@ -33,6 +33,7 @@ namespace wire {
 template <class T> constexpr std::string_view typeOf()
 {
     if constexpr (std::is_same_v<T, std::string>) return "s";
+    if constexpr (std::is_same_v<T, bool>) return "b";
     if constexpr (std::is_same_v<T, std::int64_t>) return "x";
     if constexpr (std::is_same_v<T, std::uint64_t>) return "t";
     if constexpr (std::is_same_v<T, platform::Bytes>) return "ay";
@@ -225,6 +226,14 @@ inline constexpr Method<In<std::string>, Out<platform::FileHandle, platform::Val
 inline constexpr auto kStatus = Method<In<>, Out<platform::Value>>{"Status", "", "status"}.on(kDiagnosticsInterface);
 inline constexpr auto kStatistics =
     Method<In<>, Out<std::string>>{"Statistics", "", "openMetrics"}.on(kDiagnosticsInterface);
+inline constexpr auto kFigures = Method<In<>, Out<platform::Value>>{"Figures", "", "figures"}.on(kDiagnosticsInterface);
+inline constexpr auto kWaiting = Method<In<>, Out<platform::Value>>{"Waiting", "", "waiting"}.on(kDiagnosticsInterface);
+inline constexpr auto kPreviewUploads =
+    Method<In<>, Out<Dictionaries>>{"PreviewUploads", "", "uploads"}.on(kDiagnosticsInterface);
+inline constexpr auto kPreviewRequest =
+    Method<In<Request>, Out<platform::Value, OptionalError>>{"PreviewRequest", "request", "preview error"}.on(
+        kDiagnosticsInterface);
+inline constexpr auto kWipe = Method<In<bool>>{"Wipe", "settings"}.on(kDiagnosticsInterface);
 // com.quorvane.TAVClientXPC
 inline constexpr Signal<Bag, OptionalError> kBagDidLoad{"BagDidLoad", "bag error"};
 
@@ -240,6 +249,7 @@ inline constexpr Method<In<std::uint64_t>> kInitiateConnectionWithIntent{"Initia
 inline constexpr Signal<platform::Bytes> kFlushedData{"FlushedData", "body"};
 inline constexpr Signal<std::string> kReceivedFeedbackDescription{"ReceivedFeedbackDescription", "description"};
 inline constexpr Signal<> kWorkDone{"WorkDone", ""};
+inline constexpr Signal<std::uint64_t, std::int64_t> kReplaced{"Replaced", "intent process"};
 
 } // namespace members
 

@@ -84,6 +84,17 @@ constexpr Row<TAVDiagnosticsXPC> kDiagnosticsRows[] = {
         [](TAVDiagnosticsXPC& daemon, platform::Reply<Value> reply) { reply(daemon.status()); }>(),
     row<TAVDiagnosticsXPC, members::kStatistics,
         [](TAVDiagnosticsXPC& daemon, platform::Reply<std::string> reply) { reply(daemon.statistics()); }>(),
+    row<TAVDiagnosticsXPC, members::kFigures,
+        [](TAVDiagnosticsXPC& daemon, platform::Reply<Value> reply) { reply(daemon.figures()); }>(),
+    row<TAVDiagnosticsXPC, members::kWaiting, &TAVDiagnosticsXPC::waiting>(),
+    row<TAVDiagnosticsXPC, members::kPreviewUploads, &TAVDiagnosticsXPC::previewUploads>(),
+    row<TAVDiagnosticsXPC, members::kPreviewRequest,
+        [](TAVDiagnosticsXPC& daemon, std::shared_ptr<TAVRequest> request,
+           platform::Reply<Value, OptionalError> reply) {
+            if (!request) return reply.abandon();
+            daemon.previewRequest(std::move(request), std::move(reply));
+        }>(),
+    row<TAVDiagnosticsXPC, members::kWipe, &TAVDiagnosticsXPC::wipe>(),
 };
 
 constexpr Row<TAVEndpointXPC> kEndpointRows[] = {
@@ -165,6 +176,10 @@ public:
         push(_connection, members::kReceivedFeedbackDescription, description);
     }
     void workDone() override { push(_connection, members::kWorkDone); }
+    void replaced(FlusherIntent intent, std::int64_t process) override
+    {
+        push(_connection, members::kReplaced, static_cast<std::uint64_t>(intent), process);
+    }
 
 private:
     std::weak_ptr<ipc::Connection> _connection;
@@ -205,7 +220,8 @@ const ipc::Interface& flusherInterface()
         .name = "com.quorvane.TAVFlusherXPC",
         .methods = membersOf(kFlusherRows),
         .listenerName = "com.quorvane.TAVFlusherListener",
-        .signals = {members::kFlushedData, members::kReceivedFeedbackDescription, members::kWorkDone},
+        .signals = {members::kFlushedData, members::kReceivedFeedbackDescription, members::kWorkDone,
+                    members::kReplaced},
         .introspection = kFlusherIntrospection,
     };
     return interface;

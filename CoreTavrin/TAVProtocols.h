@@ -61,6 +61,21 @@ public:
     virtual platform::Value status() = 0;
     /// Returns the statistics counters as OpenMetrics text.
     virtual std::string statistics() = 0;
+    /// Returns counts and latencies since the start, for live displays: {"requests": {kind: {"count", "failed",
+    /// "latency"}}}; see `LatencyHistogram` for "latency".
+    virtual platform::Value figures() = 0;
+    /// Replies with {"uploads", "downloads", "activities"}: lists of dictionaries that say what each waits for.
+    virtual void waiting(platform::Reply<platform::Value> reply) = 0;
+    /// Replies with what the next upload pass would send, a dictionary for each body: {"body" (bytes), "url",
+    /// "headers", "events", "open"}. Changes nothing.
+    virtual void previewUploads(platform::Reply<platform::Value::Array> reply) = 0;
+    /// Replies with the HTTP request that the daemon would send for `request`, item by item: {"url", "items",
+    /// "headers"}, each item and header with "name", "value" and "from". Sends nothing.
+    virtual void previewRequest(std::shared_ptr<TAVRequest> request,
+                                platform::Reply<platform::Value, OptionalError> reply) = 0;
+    /// Removes everything that the daemon keeps about its users, and with `settings` their settings: the process starts
+    /// again, and removes it before anything else. All connections end; the call gets no reply.
+    virtual void wipe(bool settings, platform::Reply<> reply) = 0;
 };
 
 /// The notifications that a client receives. Any thread.
@@ -104,6 +119,9 @@ public:
     virtual void flushedData(const platform::Bytes& body) = 0;
     virtual void receivedFeedbackDescription(const std::string& description) = 0;
     virtual void workDone() = 0;
+    /// Another tool, of the process `process`, has taken over what this tool watched. Nothing more is sent for
+    /// `intent`.
+    virtual void replaced(FlusherIntent /*intent*/, std::int64_t /*process*/) {}
 };
 
 /// The path of every object that the daemon exports.

@@ -3,6 +3,7 @@
 #include <memory>
 
 #include "tavrind/FeedbackBooks.h"
+#include "tavrind/RequestFigures.h"
 #include "tavrind/TavrinDiagnosticDataReporter.h"
 
 namespace platform {
@@ -46,6 +47,7 @@ struct Assembly {
     platform::Device& device;
     TavrinDiagnosticDataReporter diagnosticData;
     FeedbackBooks feedbackBooks;
+    RequestFigures requestFigures;
 
     std::shared_ptr<platform::UrlSession> urlSession; ///< foreground: every request of a client
     std::shared_ptr<platform::UrlSession> bagSession; ///< without caching; unused, the bag comes on urlSession

@@ -6,6 +6,7 @@
 #include "platform/run/Clock.h"
 #include "platform/run/Queue.h"
 #include "platform/run/Transactions.h"
+#include "platform/values/Dictionary.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/FeedbackBooks.h"
 #include "tavrind/FileContainer.h"
@@ -21,6 +22,7 @@ namespace tavrin {
 
 using namespace std::chrono_literals;
 using platform::ActivityState;
+using platform::Value;
 
 namespace {
 
@@ -28,6 +30,7 @@ constexpr const char* kActivity = "com.quorvane.tavrind.flusher.background";
 constexpr std::chrono::seconds kEarliestStart = 300s;
 constexpr std::chrono::seconds kInterval = 600s;
 constexpr std::chrono::seconds kGracePeriod = 300s;
+constexpr std::size_t kMaximumPreview = 8u << 20; // bytes of compressed bodies in one answer
 /// Age at which the file of a body counts as abandoned: no body takes that long to write.
 constexpr std::chrono::hours kOldBody(1);
 
@@ -123,6 +126,29 @@ void BackgroundActivitiesManager::_flusherActivity()
     }
     _flushToWire(*_assembly.crowdsourcingFeedbackFlusher);
     _assembly.feedbackBooks.save();
+}
+
+void BackgroundActivitiesManager::previewUploads(platform::Reply<Value::Array> reply)
+{
+    _queueFlusher->async([self = shared_from_this(), reply = std::move(reply)]() mutable {
+        Value::Array uploads;
+        std::size_t left = kMaximumPreview;
+        const auto add = [&](Value upload, bool open) {
+            const platform::Bytes* body = upload["body"].asBytes();
+            if (!body || body->size() > left) return;
+            left -= body->size();
+            if (open) upload.mutableDictionary().set("open", true);
+            uploads.push_back(std::move(upload));
+        };
+        TavrinPersistentStorage& storage = *self->_assembly.persistentStorage;
+        for (const bool open : {false, true})
+            for (const auto& container : open ? storage.getOpenSessionHandles() : storage.getAvailableSessionHandles())
+                if (const auto session = container->read().session)
+                    add(self->_feedbackFlusher->preview(*session), open);
+        TavrinFeedbackFlusher& records = *self->_assembly.crowdsourcingFeedbackFlusher;
+        for (const auto& record : records.sessionBuffer()) add(records.preview(*record), false);
+        reply(std::move(uploads));
+    });
 }
 
 /// Removes the bodies of processes that were killed while they wrote them: they hold users' events. A recent file

@@ -8,6 +8,8 @@
 
 #include "platform/base/Mutex.h"
 #include "platform/net/BackgroundSession.h"
+#include "platform/run/Reply.h"
+#include "platform/values/Value.h"
 
 namespace platform {
 class Activity;
@@ -34,6 +36,10 @@ public:
 
     /// Runs one pass, asynchronously, then calls back.
     void insertFlushActivity(std::move_only_function<void()> callback);
+    /// Replies with what a pass would upload, body by body (see `TavrinFeedbackFlusher::preview`), asynchronously. A
+    /// body with "open" is of a session that has not ended, and grows until then. Bodies beyond 8 MiB are left out.
+    /// Changes nothing.
+    void previewUploads(platform::Reply<platform::Value::Array> reply);
     /// While this is set, the background activity does nothing; passes on demand still run.
     [[nodiscard]] bool stopFlushing() const { return _stopFlushing; }
     void setStopFlushing(bool stop) { _stopFlushing = stop; }

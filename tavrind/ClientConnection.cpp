@@ -154,17 +154,17 @@ void ClientConnection::bag(BagReply reply)
     state->bag(userAgent(), std::move(reply));
 }
 
-void ClientConnection::_completeDefaults(TAVRequest& request) const
+void ClientConnection::completeDefaults(TAVRequest& request, platform::Device& device)
 {
     const platform::Log& log = tavrin::log(kLogRequest);
     if (request.keyboardInputMode.value_or("").empty()) {
-        std::string mode = _assembly.device.locale.keyboardInputMode();
-        if (mode.empty()) mode = _assembly.device.locale.defaultInputMode();
+        std::string mode = device.locale.keyboardInputMode();
+        if (mode.empty()) mode = device.locale.defaultInputMode();
         log.error("keyboardInputMode property not set, using {}", mode);
         request.keyboardInputMode = std::move(mode);
     }
     if (request.scale == 0.0) {
-        request.scale = _assembly.device.profile.profile().screenScale;
+        request.scale = device.profile.profile().screenScale;
         log.error("request scale property not set, using {:f}", request.scale);
     }
 }
@@ -175,7 +175,7 @@ void ClientConnection::request(std::shared_ptr<TAVRequest> request, RequestReply
     const RequestKind* kind = kindOf(*request);
     if (!kind) return reply.abandon();
     if (!state) return reply(request->queryId, nullptr, makeTAVError(TAVErrorInvalidResponse, "client state nil"));
-    _completeDefaults(*request);
+    completeDefaults(*request, _assembly.device);
 
     const auto queryId = static_cast<std::uint64_t>(request->queryId);
     TAVTrace(kind->traceStart, queryId);

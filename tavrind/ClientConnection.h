@@ -55,11 +55,13 @@ public:
     /// Returns the client's user agent; empty before it has configured.
     [[nodiscard]] std::string userAgent() const;
 
+    /// Sets what the client left open: the keyboard's input mode and the screen's scale.
+    static void completeDefaults(TAVRequest& request, platform::Device& device);
+
 private:
     /// Binds the connection to the state of its client if it has none yet, and returns it; null if it can't.
     std::shared_ptr<ClientState> _ensureState();
     [[nodiscard]] std::shared_ptr<ClientState> _boundState() const;
-    void _completeDefaults(TAVRequest& request) const;
     void search(ClientState& state, const RequestKind& kind, std::shared_ptr<TAVRequest> request, RequestReply reply);
     void reportEvent(std::shared_ptr<ZRFeedback> feedback, std::int64_t queryId, std::shared_ptr<void> call);
     void handleCustomFeedback(std::shared_ptr<ZRCustomFeedback> feedback, std::int64_t queryId,

@@ -1,8 +1,10 @@
 #include "tavrind/DaemonOptions.h"
 
+#include <cstdio>
 #include <cstdlib>
 #include <map>
 #include <string>
+#include <vector>
 
 #include <CLI/CLI.hpp>
 
@@ -31,10 +33,18 @@ DaemonOptions parseDaemonOptions(int argc, char** argv)
     app.add_option("--etc", options.etc, "Where locale, time zone and keyboard are read (for development)")
         ->check(CLI::ExistingDirectory)
         ->capture_default_str();
+    app.add_option("--wipe", options.wipe,
+                   "Before the start, remove everything that is kept about the users: traces, or settings, too")
+        ->check(CLI::IsMember({"traces", "settings"}));
     try {
         app.parse(argc, argv);
+    } catch (const CLI::Success& asked) { // for the help or the version
+        std::exit(app.exit(asked));
     } catch (const CLI::ParseError& error) {
-        std::exit(app.exit(error));
+        const std::vector<std::string> left = app.remaining();
+        std::fprintf(stderr, "tavrind: %s\nSee \"tavrind --help\".\n",
+                     left.empty() ? error.what() : ("unknown argument " + left.front()).c_str());
+        std::exit(2);
     }
     if (!sink.empty()) options.logToJournal = sink == "journal";
     return options;

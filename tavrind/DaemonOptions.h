@@ -11,6 +11,7 @@ struct DaemonOptions {
     platform::LogLevel logLevel = platform::LogLevel::Default;
     bool checkQueues = false;
     std::string etc = "/etc";
+    std::string wipe; ///< what to remove before the start: "traces", "settings" (both), or nothing
 };
 
 /// Parses the command line. For --help, --version and invalid options, prints a text and ends the process.

@@ -91,6 +91,7 @@ void Exchange::_answer(std::shared_ptr<TAVReply> reply, OptionalError error)
 
 void Exchange::begin()
 {
+    _begun = _assembly.device.clock.hostTicks();
     const platform::Log& log = TavrinLogForCategory(_kind.logCategory);
     if (_kind.isSearch) {
         log.log("session {} performing query[{}] {}, reply {}", _client->identifier(), _request->queryId,
@@ -155,6 +156,7 @@ bool Exchange::_answerFromCache()
     reply->geoSessionEntityString = _assembly.requestFactory->getMapsUserSessionEntity();
     _answer(std::move(reply), {});
 
+    _count("memory", _begun, false);
     if (const auto& name = _client->clientShortName())
         _assembly.diagnosticData.addValue(1, createCounterKey(*name, "ondevicecachehits"));
     _skipSearch(SkipSearchTrigger::CacheHit, hit->uuid);
@@ -179,13 +181,12 @@ void Exchange::_send()
     // Reading the GUID may replace it, which empties query caches. So it is only read for a request that is about to be
     // built.
     const platform::Uuid userGuid = guids ? guids->currentUserGUID() : platform::Uuid();
-    const ClientRequest parts{
-        .request = *_request,
-        .bag = _view.bag.get(),
-        .userGuid = userGuid,
-        .userAgent = userAgent,
-        .fieldMask = tavrin_caseInsensitiveContainsString(userAgent, "messages") ? kFieldMaskNoLocation : 0,
-        .timeout = timeout > 0 ? std::optional(requestTimeout(timeout)) : std::nullopt};
+    const ClientRequest parts{.request = *_request,
+                              .bag = _view.bag.get(),
+                              .userGuid = userGuid,
+                              .userAgent = userAgent,
+                              .fieldMask = fieldMaskFor(userAgent),
+                              .timeout = timeout > 0 ? std::optional(requestTimeout(timeout)) : std::nullopt};
     auto built = std::invoke(_kind.builder, *_assembly.requestFactory, parts);
     if (!built) {
         const Error error = makeTAVError(TAVErrorInvalidResponse, "no URL");
@@ -223,6 +224,7 @@ void Exchange::_completed(std::optional<Bytes> data, std::optional<UrlResponse> 
     const platform::Log& log = TavrinLogForCategory(_kind.logCategory);
     const int statusCode = response ? response->statusCode : 0;
     if (response) recordSearchResult(statusCode);
+    _count(_kind.name, _start->timestamp, error || statusCode < 200 || statusCode > 299);
     const std::size_t responseSize = data ? data->size() : 0;
     if (_kind.isSearch)
         log.log("Got network response for (id, query): ({}, {})", _request->queryId, Private{_request->queryString});
@@ -320,6 +322,12 @@ void Exchange::_skipSearch(SkipSearchTrigger reason, std::optional<std::string> 
 {
     _addFeedback(std::make_shared<TAVSkipSearchFeedback>(_request->queryString, reason, std::move(uuid)),
                  _request->clientQueryId);
+}
+
+void Exchange::_count(std::string_view kind, std::uint64_t begun, bool failed)
+{
+    const std::uint64_t now = _assembly.device.clock.hostTicks();
+    _assembly.requestFigures.record(kind, platform::Duration(static_cast<std::int64_t>(now - begun)), failed);
 }
 
 void Exchange::recordSearchResult(int statusCode)

@@ -57,6 +57,8 @@ private:
 
     void _addFeedback(std::shared_ptr<ZRFeedback> record, std::uint64_t clientQueryId);
     void _skipSearch(SkipSearchTrigger reason, std::optional<std::string> uuid = {});
+    /// Counts the request under `kind`, with the time since `begun`, in host ticks.
+    void _count(std::string_view kind, std::uint64_t begun, bool failed);
     void recordSearchResult(int statusCode);
     void failSearchFeedback(const std::optional<platform::Error>& error, std::size_t responseSize, int statusCode,
                             const platform::Value& timingData);
@@ -69,6 +71,7 @@ private:
     const std::shared_ptr<TAVRequest> _request;
     RequestReply _reply;
 
+    std::uint64_t _begun = 0;           // in host ticks
     ClientView _view;                   // the client after the wait for the bag
     std::uint64_t _cacheGeneration = 0; // of the query cache, before the request was built
     platform::UrlRequest _httpRequest;  // as sent

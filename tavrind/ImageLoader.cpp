@@ -185,7 +185,10 @@ void ImageLoader::_fetchImageURL(const Url& url, std::optional<platform::Duratio
     if (_imageFetches.join(url, group))
         return _startImageFetches(); // the fetch may have moved to a lane with a free slot
     const auto cache = _assembly.urlSession->cache();
-    if (cache && cache->find(url)) return log(kLogImages).log("found {} in cache", Private{url.string()});
+    if (cache && cache->find(url)) {
+        _assembly.requestFigures.record("cached image", {}, false);
+        return log(kLogImages).log("found {} in cache", Private{url.string()});
+    }
     if (!_imageFetches.add({url, timeoutInterval, source}, group))
         return log(kLogImages)
             .error("{} images wait already, not fetching {}", ImageFetches::kWaiting, Private{url.string()});
@@ -230,6 +233,9 @@ void ImageLoader::_endImageFetch(const Load& load, const std::optional<UrlRespon
 {
     const std::string& url = load.url.string();
     const int statusCode = response ? response->statusCode : 0;
+    const std::uint64_t taken = _assembly.device.clock.hostTicks() - load.start->timestamp;
+    _assembly.requestFigures.record("image", platform::Duration(static_cast<std::int64_t>(taken)),
+                                    error || statusCode != 200);
     if (error) {
         log(kLogImages).error("Error fetching image {}: {}", Private{url}, error->description());
         ClientSessionManager::reportErrorAsTavrindFeedback(

@@ -28,17 +28,15 @@
 
 namespace tavrin {
 
-namespace {
-
-using namespace std::chrono_literals;
-
-/// Returns the file of the certification authorities that replace the system's; empty if there is none. OpenSSL reads
-/// the same variable.
 std::string caFile()
 {
     const char* path = std::getenv("SSL_CERT_FILE");
     return path ? path : "";
 }
+
+namespace {
+
+using namespace std::chrono_literals;
 
 platform::UrlSessionConfiguration foregroundConfiguration(const platform::Device& device)
 {
@@ -62,7 +60,7 @@ platform::UrlSessionConfiguration foregroundConfiguration(const platform::Device
 Daemon::Daemon(platform::Device& device) : assembly(device) {}
 Daemon::~Daemon() = default;
 
-platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device)
+platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device, StartOptions options)
 {
     TAVTracingSetup(device.userDefaults);
     if (device.userDefaults.boolean("TAVLogPrivateData")) platform::Log::privateData = true;
@@ -108,7 +106,7 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device)
     assembly.periodicTaskManager = std::make_shared<TavrinDPPeriodicTaskManager>(assembly);
     daemon->deepLinkIngester = std::make_shared<TavrinDPAppDeepLinkIngester>(assembly, std::random_device()());
     daemon->deepLinkIngester->scheduleMaintenance();
-    daemon->service = TavrinService::make(assembly);
+    daemon->service = TavrinService::make(assembly, std::move(options));
 
     auto listener = device.ipc.listen(daemonInterface(), "com.quorvane.tavrind.connection");
     if (!listener) {

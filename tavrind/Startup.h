@@ -1,9 +1,11 @@
 #pragma once
 
 #include <memory>
+#include <string>
 
 #include "platform/values/Error.h"
 #include "tavrind/Assembly.h"
+#include "tavrind/Restart.h"
 
 namespace platform {
 struct Device;
@@ -16,6 +18,10 @@ namespace tavrin {
 
 class TavrinDPAppDeepLinkIngester;
 class TavrinService;
+
+/// Returns the file of the certification authorities that replace the system's; empty if there is none. OpenSSL reads
+/// the same variable.
+[[nodiscard]] std::string caFile();
 
 /// A started daemon: the services, and the objects that only the entry point owns.
 struct Daemon {
@@ -30,6 +36,6 @@ struct Daemon {
 
 /// Creates the services in their fixed order, then starts to listen. Fails only if the service's socket is not
 /// available, for example because another daemon serves it. The device must outlive the daemon.
-[[nodiscard]] platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device);
+[[nodiscard]] platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device, StartOptions options = {});
 
 } // namespace tavrin

@@ -2,6 +2,7 @@
 
 #include <fmt/format.h>
 
+#include "CoreTavrin/ClientVocabulary.h"
 #include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVRequest.h"
 #include "platform/device/Device.h"
@@ -61,17 +62,28 @@ struct TAVNetworkRequestFactory::Recipe {
     std::string digest = {};
     bool includeLatLong = false;
     std::optional<Duration> timeout = {};
-    std::string signature = {}; // of the installed applications
+    std::string signature = {};   // of the installed applications
+    std::string_view origin = {}; // of what is added now
 
     [[nodiscard]] const TAVRequest& request() const { return client->request; }
     void item(const char* name, const std::string& value)
     {
-        if (!value.empty()) builder.defaultQueryItemWithName(name, value);
+        if (value.empty()) return;
+        if (origins() && !builder.containsQueryItemWithName(name)) origins()->items[name] = origin;
+        builder.defaultQueryItemWithName(name, value);
     }
     void header(const char* name, const std::string& value)
     {
-        if (!value.empty()) builder.defaultHttpHeaderWithName(name, value);
+        if (value.empty()) return;
+        if (origins() && !builder.containsHttpHeaderWithName(name)) origins()->headers[name] = origin;
+        builder.defaultHttpHeaderWithName(name, value);
     }
+    void force(const QueryItem& item)
+    {
+        if (origins()) origins()->items[item.name] = origin;
+        builder.forceQueryItem(item);
+    }
+    [[nodiscard]] RequestOrigins* origins() const { return client ? client->origins : nullptr; }
     [[nodiscard]] bool masked() const
     {
         return (client->fieldMask & kFieldMaskNoLocation) && (kind & (kSearch | kZeroKeyword | kMoreResults));
@@ -79,74 +91,79 @@ struct TAVNetworkRequestFactory::Recipe {
 
     static void addLookupItems(Recipe& r, const RequestContext&);
 
-    /// A shared item or header: the kinds that have it, and the function that adds it. Empty values are omitted.
+    /// A shared item or header: the kinds that have it, its origin in a client's request, and the function that adds
+    /// it. Empty values are omitted.
     struct Rule {
         unsigned kinds;
+        std::string_view origin;
         void (*apply)(Recipe&, const RequestContext&);
     };
     static const std::vector<Rule> kRules; // the table of docs/requests.md
 };
 
 const std::vector<TAVNetworkRequestFactory::Recipe::Rule> TAVNetworkRequestFactory::Recipe::kRules{
-    {kBagFetch | kClient | kDownload | kUpload, [](auto& r, auto&) { r.item("key", kApiKey); }},
-    {kBagFetch | kBagCache, [](auto& r, auto&) { r.item("version", r.version); }},
-    {kBagCache, [](auto& r, auto&) { r.item("agent", r.userAgent); }},
-    {kBagFetch | kBagCache | kClient | kUpload, [](auto& r, auto& c) { r.item("locale", c.localeIdentifier); }},
-    {kBagFetch | kBagCache | kClient, [](auto& r, auto& c) { r.item("esl", c.effectiveSystemLanguage); }},
-    {kBagFetch | kBagCache | (kClient & ~kMoreResults) | kUpload,
+    {kBagFetch | kClient | kDownload | kUpload, "default", [](auto& r, auto&) { r.item("key", kApiKey); }},
+    {kBagFetch | kBagCache, "default", [](auto& r, auto&) { r.item("version", r.version); }},
+    {kBagCache, "default", [](auto& r, auto&) { r.item("agent", r.userAgent); }},
+    {kBagFetch | kBagCache | kClient | kUpload, "device",
+     [](auto& r, auto& c) { r.item("locale", c.localeIdentifier); }},
+    {kBagFetch | kBagCache | kClient, "device", [](auto& r, auto& c) { r.item("esl", c.effectiveSystemLanguage); }},
+    {kBagFetch | kBagCache | (kClient & ~kMoreResults) | kUpload, "device",
      [](auto& r, auto& c) { r.item("cc", c.geoDeviceCountryCode); }},
-    {kBagFetch | kClient | kUpload, [](auto& r, auto& c) { r.header("X-Quorvane-Languages", c.preferredLanguages); }},
-    {kSearch, [](auto& r, auto&) { r.item("card", "1"); }},
-    {kSearch,
+    {kBagFetch | kClient | kUpload, "device",
+     [](auto& r, auto& c) { r.header("X-Quorvane-Languages", c.preferredLanguages); }},
+    {kSearch, "default", [](auto& r, auto&) { r.item("card", "1"); }},
+    {kSearch, "user",
      [](auto& r, auto&) {
          if (r.request().topics.count() > 0) r.header("X-Quorvane-TopTopics", platform::toJson(r.request().topics));
      }},
-    {kSearch | kZeroKeyword | kLookup | kFlight,
+    {kSearch | kZeroKeyword | kLookup | kFlight, "user",
      [](auto& r, auto&) { r.item("kb_ime", r.request().keyboardInputMode.value_or("")); }},
-    {kSearch | kZeroKeyword,
+    {kSearch | kZeroKeyword, "device",
      [](auto& r, auto& c) {
          r.item("calendar", c.localeCalendarIdentifier);
          r.item("time_zone", c.localTimeZoneName);
          r.item("units", c.localeMeasurementSystem);
      }},
-    {kSearch, [](auto& r, auto& c) { r.item("24h", c.is24hDateFormat); }},
-    {kClient & ~kMoreResults, [](auto& r, auto& c) { r.header("X-Quorvane-GeoMetadata", c.geoClientMetadata); }},
-    {kClient,
+    {kSearch, "device", [](auto& r, auto& c) { r.item("24h", c.is24hDateFormat); }},
+    {kClient & ~kMoreResults, "device",
+     [](auto& r, auto& c) { r.header("X-Quorvane-GeoMetadata", c.geoClientMetadata); }},
+    {kClient, "device",
      [](auto& r, auto& c) {
          if (r.masked()) return;
          r.item("latlng", c.geoLocationLatLng);
          r.item("geosrc", c.geoLocationSource);
      }},
-    {kClient & ~kZeroKeyword,
+    {kClient & ~kZeroKeyword, "device",
      [](auto& r, auto&) {
          if (!r.masked()) r.header("X-Quorvane-Whitelisted-App-Signature", r.signature);
      }},
-    {kClient & ~kCard, [](auto& r, auto& c) { r.item("mode", c.isManagedAccount ? "managed" : ""); }},
-    {kClient, [](auto& r, auto& c) { r.item("storefront", c.storeFrontIdentifier); }},
-    {kClient, [](auto& r, auto& c) { r.header("X-Quorvane-Subscriptions", c.subscriptionInfo); }},
-    {kClient,
+    {kClient & ~kCard, "device", [](auto& r, auto& c) { r.item("mode", c.isManagedAccount ? "managed" : ""); }},
+    {kClient, "device", [](auto& r, auto& c) { r.item("storefront", c.storeFrontIdentifier); }},
+    {kClient, "device", [](auto& r, auto& c) { r.header("X-Quorvane-Subscriptions", c.subscriptionInfo); }},
+    {kClient, "device",
      [](auto& r, auto& c) {
          const Uuid& guid = r.client->userGuid.isNil() ? c.userGuid : r.client->userGuid;
          if (!guid.isNil()) r.header("X-Quorvane-UserGuid", guid.string());
      }},
-    {kBagFetch | kClient | kDownload | kUpload, [](auto& r, auto&) { r.header("User-Agent", r.userAgent); }},
-    {kClient,
+    {kBagFetch | kClient | kDownload | kUpload, "client", [](auto& r, auto&) { r.header("User-Agent", r.userAgent); }},
+    {kClient, "user",
      [](auto& r, auto&) {
          if (r.request().scale > 0) r.header("X-Quorvane-UI-Scale", fmt::format("{:.1f}", r.request().scale));
      }},
-    {kSearch | kZeroKeyword | kCard,
+    {kSearch | kZeroKeyword | kCard, "device",
      [](auto& r, auto& c) {
          if (r.client->bag && r.client->bag->sendGeoEnvironmentHeader())
              r.header("X-Quorvane-GeoEnvironment", c.geoEnvironment);
      }},
-    {kClient & ~kMoreResults, [](auto& r, auto& c) { r.header("X-Quorvane-GeoSession", c.geoSessionId); }},
-    {kLookup, &Recipe::addLookupItems},
-    {kDownload,
+    {kClient & ~kMoreResults, "device", [](auto& r, auto& c) { r.header("X-Quorvane-GeoSession", c.geoSessionId); }},
+    {kLookup, "user", &Recipe::addLookupItems},
+    {kDownload, "device",
      [](auto& r, auto& c) {
          if (r.includeLatLong) r.header("X-Quorvane-FuzzedLatLong", c.lookupGeoLocationLatLng);
      }},
-    {kDownload, [](auto& r, auto&) { r.header("If-None-Match", r.version); }},
-    {kUpload, [](auto& r, auto&) { r.header("X-Quorvane-Digest", r.digest); }},
+    {kDownload, "device", [](auto& r, auto&) { r.header("If-None-Match", r.version); }},
+    {kUpload, "device", [](auto& r, auto&) { r.header("X-Quorvane-Digest", r.digest); }},
 };
 
 void TAVNetworkRequestFactory::Recipe::addLookupItems(Recipe& r, const RequestContext&)
@@ -163,6 +180,11 @@ void TAVNetworkRequestFactory::Recipe::addLookupItems(Recipe& r, const RequestCo
                                                                             : "default");
     r.item("qlang", language(lookup.queryString));
     r.item("lctxlang", language(lookup.queryContext.value_or("")));
+}
+
+std::uint64_t fieldMaskFor(std::string_view userAgent)
+{
+    return tavrin_caseInsensitiveContainsString(userAgent, "messages") ? kFieldMaskNoLocation : 0;
 }
 
 std::shared_ptr<TAVNetworkRequestFactory> TAVNetworkRequestFactory::make(Assembly& assembly)
@@ -247,12 +269,18 @@ UrlRequest TAVNetworkRequestFactory::build(Recipe& recipe)
         recipe.signature = _assembly.appWhitelistController->whitelistSignature();
 
     UrlRequest request = _contextAccessQueue->sync([&] {
+        recipe.origin = "user";
         if (recipe.client)
             for (const auto& item : recipe.request().queryItems)
-                if (item) recipe.builder.forceQueryItemWithName(item->name, item->value);
-        if (recipe.kind != kDownload) recipe.builder.forceQueryItemsFromArray(_context.debuggingQueryItems);
-        for (const Recipe::Rule& rule : Recipe::kRules)
-            if (rule.kinds & recipe.kind) rule.apply(recipe, _context);
+                if (item) recipe.force({item->name, item->value});
+        recipe.origin = "settings";
+        if (recipe.kind != kDownload)
+            for (const QueryItem& item : _context.debuggingQueryItems) recipe.force(item);
+        for (const Recipe::Rule& rule : Recipe::kRules) {
+            if (!(rule.kinds & recipe.kind)) continue;
+            recipe.origin = rule.origin;
+            rule.apply(recipe, _context);
+        }
         return recipe.builder.createMutableUrlRequest();
     });
 
@@ -296,8 +324,16 @@ TAVNetworkRequestFactory::Request TAVNetworkRequestFactory::_clientRequest(unsig
                   .timeout = client.timeout};
     // If the search sent its location, the URL of its further results contains it.
     const bool placed = kind == kMoreResults && recipe.builder.containsQueryItemWithName("latlng");
-    if (kind != kCard && !placed) _startLocationUpdate();
-    recipe.builder.forceQueryItemsFromArray(forced);
+    if (kind != kCard && !placed && !client.origins) _startLocationUpdate();
+    if (client.origins) {
+        const bool ofBag = kind != kMoreResults && kind != kCard;
+        for (const QueryItem& item : platform::UrlComponents(*url).queryItems())
+            client.origins->items[item.name] = ofBag ? "bag" : "answer";
+    }
+    for (const QueryItem& item : forced) {
+        recipe.origin = item.name == "q" ? "user" : "default";
+        recipe.force(item);
+    }
     if (!recipe.timeout && client.bag)
         if (const auto seconds = client.bag->timeoutIntervalForRequest()) recipe.timeout = requestTimeout(*seconds);
     return build(recipe);

@@ -2,10 +2,12 @@
 
 #include <atomic>
 #include <cstdint>
+#include <map>
 #include <memory>
 #include <optional>
 #include <set>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "platform/base/Uuid.h"
@@ -37,6 +39,8 @@ inline constexpr const char* TAVEffectiveSettingsChangeNotification = "TAVEffect
 
 /// Bit of a field mask: omits the device's location and its installed applications.
 inline constexpr std::uint64_t kFieldMaskNoLocation = 1;
+/// Returns the mask of a client's requests.
+[[nodiscard]] std::uint64_t fieldMaskFor(std::string_view userAgent);
 
 /// The state of the device that requests report. Requests omit empty texts.
 struct RequestContext {
@@ -62,6 +66,13 @@ struct RequestContext {
     std::vector<platform::QueryItem> debuggingQueryItems;
 };
 
+/// Where the parts of a request come from, by name: "bag", "answer" (the URL of an earlier answer), "user" (the
+/// client's request), "client", "device", "settings" or "default" (the same in all requests of the kind).
+struct RequestOrigins {
+    std::map<std::string, std::string_view> items;
+    std::map<std::string, std::string_view> headers;
+};
+
 /// A client's request, with the client's properties that it contains. It only refers to its parts: valid during the
 /// call.
 struct ClientRequest {
@@ -71,6 +82,7 @@ struct ClientRequest {
     std::string userAgent;
     std::uint64_t fieldMask = 0;               ///< for search, zero keyword and more results; others ignore it
     std::optional<platform::Duration> timeout; ///< the client's; default: the bag's
+    RequestOrigins* origins = nullptr; ///< for a preview: receives the origins, and no location update is requested
 };
 
 /// Builds every HTTP request that the daemon sends to the service.

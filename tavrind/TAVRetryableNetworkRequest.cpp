@@ -25,6 +25,7 @@ std::shared_ptr<platform::UrlTask> dataTaskWithRetryableRequest(platform::Device
             if (!error || device.clock.wallNow() > deadline || retriesLeft == 0)
                 return completion(std::move(data), std::move(response), std::move(error), timingData);
 
+            if (request.failed) request.failed(*error);
             const platform::Duration delay = request.delayOnFail ? kDelayOnFail : platform::Duration::zero();
             device.globalQueue(platform::Priority::High)
                 ->after(delay, [&device, session, request = std::move(request), attempt, retriesLeft,

@@ -19,6 +19,8 @@ struct TAVRetryableNetworkRequest {
     /// A failure after this moment is final. Without a moment, every failure is final.
     std::optional<platform::Date> expire;
     bool delayOnFail = false; ///< wait 1.5 s before each repetition; the delay does not grow
+    /// Called for each failed attempt that will be repeated, on the session's delegate queue; may be null.
+    std::function<void(const platform::Error&)> failed = {};
 };
 
 /// Called once, for the last attempt, on the session's delegate queue, with that attempt's timing data.

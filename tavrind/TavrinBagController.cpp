@@ -110,6 +110,7 @@ struct TavrinBagController::Fetch {
     std::shared_ptr<ClientSession> session;
     std::shared_ptr<ZRStartNetworkSearchFeedback> start;
     std::string userGuid;
+    std::string url;
     Value timingData;
     Completion completion;
     platform::Clock::TimerId limit = 0;
@@ -333,6 +334,7 @@ void TavrinBagController::_fetchBagStateWithVersion(const std::string& version, 
     auto fetch = std::make_shared<Fetch>();
     fetch->transaction = _assembly.device.transactions.begin("bagFetch");
     fetch->completion = std::move(completion);
+    fetch->url = request.url.string();
     fetch->start = startNetworkSearchFeedback("", request, StartSearchTrigger::Bag, EndpointType::TavrinBag);
     fetch->start->timestamp = _assembly.device.clock.hostTicks();
     if (_assembly.guidController) fetch->userGuid = _assembly.guidController->currentUserGUID().string();
@@ -340,7 +342,14 @@ void TavrinBagController::_fetchBagStateWithVersion(const std::string& version, 
         _assembly, std::make_shared<TavrinFeedback>(fetch->start, 0, fetch->userGuid, _userAgent));
 
     auto task = dataTaskWithRetryableRequest(
-        _assembly.device, _assembly.urlSession, {.httpRequest = request, .expire = std::nullopt, .delayOnFail = true},
+        _assembly.device, _assembly.urlSession,
+        {.httpRequest = request,
+         .expire = std::nullopt,
+         .delayOnFail = true,
+         .failed =
+             [weak = weak_from_this(), url = fetch->url](const Error& error) {
+                 if (const auto self = weak.lock()) self->_noteAttempt(url, nullptr, &error);
+             }},
         1, kFetchRetries, [weak = weak_from_this(), fetch](auto data, auto response, auto error, Value timingData) {
             auto self = weak.lock();
             if (!self) {
@@ -402,6 +411,9 @@ void TavrinBagController::_fetchCompleted(Fetch& fetch, std::optional<platform::
         _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.bag.fetches");
     }
 
+    const std::uint64_t taken = _assembly.device.clock.hostTicks() - fetch.start->timestamp;
+    _assembly.requestFigures.record("bag", platform::Duration(static_cast<std::int64_t>(taken)), error.has_value());
+    _noteAttempt(fetch.url, response ? &*response : nullptr, error ? &*error : nullptr);
     if (error) {
         addFeedback(std::make_shared<ZRErrorFeedback>(*error));
         _assembly.notificationCenter.post({.name = TAVBagChangeNotification, .userInfo = {{"bagError", *error}}});
@@ -411,6 +423,27 @@ void TavrinBagController::_fetchCompleted(Fetch& fetch, std::optional<platform::
     if (fetch.completion) fetch.completion(bag, error);
     _fetchInProgress = false;
     fetch.transaction = {};
+}
+
+void TavrinBagController::_noteAttempt(const std::string& url, const platform::UrlResponse* response,
+                                       const Error* error)
+{
+    platform::Dictionary attempt{{"at", platform::secondsSince1970(_assembly.device.clock.wallNow())}, {"url", url}};
+    if (response) {
+        attempt.set("status", response->statusCode);
+        if (const std::string* date = response->headers.find("Date")) attempt.set("serverDate", *date);
+    }
+    if (error) {
+        attempt.set("reason", error->reason().empty() ? error->description() : error->reason());
+        attempt.set("code", error->code);
+    }
+    _lastFetch = std::make_shared<const Value>(std::move(attempt));
+}
+
+Value TavrinBagController::lastFetch() const
+{
+    const auto attempt = _lastFetch.load();
+    return attempt ? *attempt : Value();
 }
 
 void TavrinBagController::_handleRefreshNotification()

@@ -93,6 +93,10 @@ public:
     void forceFetchBag(const platform::Value& announcement);
 
     [[nodiscard]] bool fetchInProgress() const { return _fetchInProgress; }
+    /// Describes the last attempt to fetch a bag: {"at": seconds since 1970, "url"}, then "status" if there was a
+    /// response, "reason" and "code" if it failed, and "serverDate" if the response has a Date header. Null before the
+    /// first. For diagnostics; starts no fetch.
+    [[nodiscard]] platform::Value lastFetch() const;
 
 private:
     using Completion = std::move_only_function<void(std::shared_ptr<const TAVBag>, std::optional<platform::Error>)>;
@@ -115,6 +119,7 @@ private:
     void _fetchBagStateWithVersion(const std::string& version, Completion completion);
     void _fetchCompleted(Fetch& fetch, std::optional<platform::Bytes> data,
                          std::optional<platform::UrlResponse> response, std::optional<platform::Error> error);
+    void _noteAttempt(const std::string& url, const platform::UrlResponse* response, const platform::Error* error);
     void _handleRefreshNotification();
 
     Assembly& _assembly;
@@ -124,6 +129,7 @@ private:
     std::string _userAgent;
     std::atomic<std::shared_ptr<const CacheUrl>> _cacheUrl;
     std::atomic<bool> _fetchInProgress = false;
+    std::atomic<std::shared_ptr<const platform::Value>> _lastFetch;
     platform::NotificationCenter::Token _refreshObserver;
 };
 

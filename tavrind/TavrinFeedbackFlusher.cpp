@@ -249,6 +249,28 @@ void TavrinFeedbackFlusher::_upload(const std::filesystem::path& fpath, const st
     (*task)->resume();
 }
 
+Value TavrinFeedbackFlusher::preview(Flushable& object)
+{
+    const std::size_t events = object.recordedEvents();
+    CompressedOutputStream stream;
+    stream.open();
+    const auto count = object.getFeedbacksToSend(stream);
+    stream.close();
+    if (!count || stream.streamError()) return {};
+    const std::string& body = static_cast<const MemoryOutputStream&>(stream.outputStream()).contents();
+    platform::Dictionary preview{
+        {"flusher", convertIdentifierToString(_identifier)}, {"body", platform::Bytes(body)}, {"events", events}};
+    if (const auto endpoint = serverEndpoint()) {
+        const platform::UrlRequest request =
+            _assembly.requestFactory->flusherUploadRequest(*endpoint, kUploadTimeout, stream.dataDigestForStream());
+        platform::Dictionary headers;
+        for (const auto& [name, value] : request.headers) headers.set(name, value);
+        preview.set("url", request.url.string());
+        preview.set("headers", std::move(headers));
+    }
+    return preview;
+}
+
 std::size_t TavrinFeedbackFlusher::countOfDatabuffer()
 {
     return _queueBuffer->sync([this] { return _sessionBuffer.size(); });

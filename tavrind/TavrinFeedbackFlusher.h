@@ -83,6 +83,10 @@ public:
     /// Flushes and returns the compressed bodies. Blocks on the queue.
     Bodies flushToWireSync();
 
+    /// Returns what a flush of `object` would upload now: {"flusher", "body" (bytes), "url", "headers", "events"};
+    /// "url" and "headers" are missing without an endpoint. Returns null if the object can't be written as JSON. Blocks
+    /// on the queue. Uses up the object, unless it is a record that is sent on its own.
+    [[nodiscard]] platform::Value preview(Flushable& object);
     // These block on the queue.
     [[nodiscard]] std::size_t countOfDatabuffer();
     [[nodiscard]] std::vector<std::shared_ptr<Flushable>> sessionBuffer();

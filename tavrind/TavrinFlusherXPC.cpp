@@ -5,6 +5,7 @@
 #include "platform/device/Device.h"
 #include "platform/run/Group.h"
 #include "platform/run/Queue.h"
+#include "platform/values/Dictionary.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/BackgroundActivitiesManager.h"
 #include "tavrind/ClientConnection.h"
@@ -19,17 +20,18 @@ namespace {
 /// Passes the commands of one tool's connection to the bridge, with the tool's own proxy.
 class ToolConnection final : public TAVFlusherXPC {
 public:
-    ToolConnection(std::weak_ptr<TavrinFlusherXPC> bridge, std::shared_ptr<TAVFlusherListener> tool)
-        : _bridge(std::move(bridge)), _tool(std::move(tool))
+    ToolConnection(std::weak_ptr<TavrinFlusherXPC> bridge, std::shared_ptr<TAVFlusherListener> tool, pid_t process)
+        : _bridge(std::move(bridge)), _tool(std::move(tool)), _process(process)
     {}
     void initiateConnectionWithIntent(std::uint64_t intent) override
     {
-        if (const auto bridge = _bridge.lock()) bridge->initiateConnectionWithIntent(intent, _tool);
+        if (const auto bridge = _bridge.lock()) bridge->initiateConnectionWithIntent(intent, _tool, _process);
     }
 
 private:
     std::weak_ptr<TavrinFlusherXPC> _bridge;
     std::shared_ptr<TAVFlusherListener> _tool;
+    const pid_t _process;
 };
 
 } // namespace
@@ -65,7 +67,7 @@ std::string TavrinFlusherXPC::endpoint() const
 void TavrinFlusherXPC::_accept(const std::shared_ptr<platform::ipc::Connection>& connection)
 {
     const Tool tool = makeFlusherListenerProxy(connection);
-    const auto commands = std::make_shared<ToolConnection>(weak_from_this(), tool);
+    const auto commands = std::make_shared<ToolConnection>(weak_from_this(), tool, connection->peer().pid);
     connection->setPushErrorHandler(
         [](const std::string& reason) { log(kLogFlusher).error("remote proxy error: {}", reason); });
     connection->exportObject(flusherHandler(commands));
@@ -90,17 +92,37 @@ void TavrinFlusherXPC::_removeDelegate(const Tool& tool)
         remove(_sendingStreamListener, "sending stream");
         remove(_remoteObject, "remote");
         _eventsAreWatched = _receivingStreamListener != nullptr;
+        _processes.erase(tool.get());
     });
 }
 
-void TavrinFlusherXPC::initiateConnectionWithIntent(std::uint64_t intent, std::shared_ptr<TAVFlusherListener> tool)
+platform::Value TavrinFlusherXPC::watchers() const
+{
+    return _queue->sync([this] {
+        platform::Dictionary watchers;
+        const auto add = [&](const char* name, const Tool& tool) {
+            if (tool) watchers.set(name, _processes.at(tool.get()));
+        };
+        add("events", _receivingStreamListener);
+        add("flushes", _sendingStreamListener);
+        return platform::Value(std::move(watchers));
+    });
+}
+
+void TavrinFlusherXPC::initiateConnectionWithIntent(std::uint64_t intent, std::shared_ptr<TAVFlusherListener> tool,
+                                                    pid_t process)
 {
     const void* delegate = tool.get();
     const auto assign = [&](Tool TavrinFlusherXPC::* role) {
-        _queue->sync([&] {
-            _remoteObject = this->*role = tool;
+        const Tool before = _queue->sync([&] {
+            _processes[tool.get()] = process;
+            Tool replaced = std::exchange(this->*role, tool);
+            _remoteObject = tool;
             _eventsAreWatched = _receivingStreamListener != nullptr;
+            return replaced;
         });
+        const bool watched = role != &TavrinFlusherXPC::_remoteObject;
+        if (watched && before && before != tool) before->replaced(static_cast<FlusherIntent>(intent), process);
     };
     switch (static_cast<FlusherIntent>(intent)) {
     case FlusherIntent::WatchFlushes:

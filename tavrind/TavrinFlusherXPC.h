@@ -2,8 +2,10 @@
 
 #include <atomic>
 #include <functional>
+#include <map>
 #include <memory>
 #include <string>
+#include <sys/types.h>
 #include <vector>
 
 #include "CoreTavrin/TAVProtocols.h"
@@ -32,8 +34,11 @@ public:
     /// Returns the listener's address.
     [[nodiscard]] std::string endpoint() const;
 
-    /// Handles a command of `tool`, a `FlusherIntent`; any other number is logged and ignored.
-    void initiateConnectionWithIntent(std::uint64_t intent, std::shared_ptr<TAVFlusherListener> tool);
+    /// Handles a command of `tool`, which belongs to `process`: a `FlusherIntent`; any other number is logged and
+    /// ignored.
+    void initiateConnectionWithIntent(std::uint64_t intent, std::shared_ptr<TAVFlusherListener> tool, pid_t process);
+    /// Returns the processes of the tools that watch: {"events", "flushes"}; without a tool, its key is missing.
+    [[nodiscard]] platform::Value watchers() const;
 
     /// Sends a flushed body to the tool that watches bodies, if any.
     void sendDataToSendingStreamListener(const platform::Bytes& body);
@@ -55,7 +60,8 @@ private:
     Tool _remoteObject;                            ///< the tool that connected or sent a command last
     Tool _sendingStreamListener;
     Tool _receivingStreamListener;
-    std::atomic<bool> _eventsAreWatched = false; ///< there is a `_receivingStreamListener`; any thread
+    std::map<const TAVFlusherListener*, pid_t> _processes; ///< of the two listeners
+    std::atomic<bool> _eventsAreWatched = false;           ///< there is a `_receivingStreamListener`; any thread
 };
 
 } // namespace tavrin

@@ -177,6 +177,21 @@ std::vector<std::shared_ptr<FileContainer>> TavrinPersistentStorage::getAvailabl
     });
 }
 
+std::vector<std::shared_ptr<FileContainer>> TavrinPersistentStorage::getOpenSessionHandles()
+{
+    return _queue->sync([this] {
+        std::vector<std::shared_ptr<FileContainer>> open;
+        for (const std::string& name : _assembly.fileManager.list(_cachesUrl).value_or(std::vector<std::string>())) {
+            const fs::path fileUrl = _cachesUrl / name;
+            if (sessionNumber(name) && std::ranges::find(_fileContainers, fileUrl, [](const auto& container) {
+                                           return container->fileUrl();
+                                       }) == _fileContainers.end())
+                open.push_back(std::make_shared<FileContainer>(_store, fileUrl));
+        }
+        return open;
+    });
+}
+
 void TavrinPersistentStorage::closeSessionWithFileContainer(std::shared_ptr<FileContainer> container)
 {
     _queue->async([self = shared_from_this(), container = std::move(container)]() mutable {

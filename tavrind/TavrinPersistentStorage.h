@@ -42,6 +42,8 @@ public:
     [[nodiscard]] std::shared_ptr<FileContainer> createFileContainerForWriting(FileUse use);
     /// Returns the closed files in the order of their numbers. They stay in the list. Blocks on the queue.
     [[nodiscard]] std::vector<std::shared_ptr<FileContainer>> getAvailableSessionHandles();
+    /// Returns the files of sessions that have not ended, for reading only. Blocks on the queue.
+    [[nodiscard]] std::vector<std::shared_ptr<FileContainer>> getOpenSessionHandles();
     /// Closes a file and lists it, asynchronously.
     void closeSessionWithFileContainer(std::shared_ptr<FileContainer> container);
     /// Deletes a file and removes it from the list, asynchronously.

@@ -1,21 +1,35 @@
 #include "tavrind/TavrinService.h"
 
 #include <algorithm>
+#include <functional>
+#include <map>
 #include <unistd.h>
 
 #include "CoreTavrin/TAVBag.h"
+#include "CoreTavrin/TAVError.h"
+#include "CoreTavrin/TAVRequest.h"
+#include "CoreTavrin/TAVSessionConfiguration.h"
+#include "platform/base/Mutex.h"
+#include "platform/device/ActivityScheduler.h"
 #include "platform/device/Device.h"
 #include "platform/device/ProcessIdentity.h"
 #include "platform/files/Counters.h"
+#include "platform/files/Files.h"
 #include "platform/files/UserDefaults.h"
+#include "platform/net/BackgroundSession.h"
 #include "platform/run/Clock.h"
+#include "platform/run/Group.h"
 #include "platform/run/Transactions.h"
 #include "platform/values/Dictionary.h"
 #include "tavrind/Assembly.h"
+#include "tavrind/BackgroundActivitiesManager.h"
 #include "tavrind/ClientConnection.h"
 #include "tavrind/ClientSessionManager.h"
 #include "tavrind/ClientStateManager.h"
 #include "tavrind/QueueRanks.h"
+#include "tavrind/RequestKind.h"
+#include "tavrind/Startup.h"
+#include "tavrind/TAVNetworkRequestFactory.h"
 #include "tavrind/TavrinBagController.h"
 #include "tavrind/TavrinFlusherXPC.h"
 #include "tavrind/TavrinLogging.h"
@@ -26,9 +40,9 @@ namespace tavrin {
 using platform::Value;
 namespace ipc = platform::ipc;
 
-std::shared_ptr<TavrinService> TavrinService::make(Assembly& assembly)
+std::shared_ptr<TavrinService> TavrinService::make(Assembly& assembly, StartOptions options)
 {
-    auto service = std::make_shared<TavrinService>(assembly);
+    auto service = std::make_shared<TavrinService>(assembly, std::move(options));
     assembly.guidController = std::make_shared<TavrinUserGUIDController>(assembly);
     assembly.clientSessionManager = std::make_shared<ClientSessionManager>(assembly, assembly.guidController, "tavrin");
     assembly.flusherXPCListener = TavrinFlusherXPC::make(assembly, [weak = service->weak_from_this()] {
@@ -38,8 +52,8 @@ std::shared_ptr<TavrinService> TavrinService::make(Assembly& assembly)
     return service;
 }
 
-TavrinService::TavrinService(Assembly& assembly)
-    : _assembly(assembly), _started(assembly.device.clock.wallNow()),
+TavrinService::TavrinService(Assembly& assembly, StartOptions options)
+    : _assembly(assembly), _options(std::move(options)), _started(assembly.device.clock.wallNow()),
       _queue(assembly.device.serialQueue("com.quorvane.tavrin.serviceQueue", rank::kManager))
 {}
 
@@ -129,8 +143,18 @@ Value TavrinService::status()
             bag.set("expiresIn", *expiration - platform::secondsSince1970(now));
     }
 
+    if (Value fetch = _assembly.bagController->lastFetch(); fetch.asDictionary()) {
+        fetch.mutableDictionary().set("ago", platform::secondsSince1970(now) - fetch["at"].asDouble().value_or(0));
+        bag.set("lastFetch", std::move(fetch));
+    }
+
     platform::Dictionary transactions;
     for (const auto& [name, count] : device.transactions.open()) transactions.set(name, count);
+
+    const platform::Directories& places = device.directories;
+    platform::Dictionary directories{{"caches", places.caches.string()},   {"config", places.config.string()},
+                                     {"state", places.state.string()},     {"data", places.data.string()},
+                                     {"runtime", places.runtime.string()}, {"temporary", places.temporary.string()}};
 
     Value::Array hosts;
     for (const std::string& host : _assembly.clientStateManager->validImageHosts()) hosts.emplace_back(host);
@@ -144,12 +168,96 @@ Value TavrinService::status()
                                 {"bag", std::move(bag)},
                                 {"transactions", std::move(transactions)},
                                 {"feedback", _assembly.feedbackBooks.description()},
-                                {"validImageHosts", std::move(hosts)}});
+                                {"validImageHosts", std::move(hosts)},
+                                {"watchers", _assembly.flusherXPCListener->watchers()},
+                                {"flushingStopped", _assembly.backgroundFlusher->stopFlushing()},
+                                {"directories", std::move(directories)},
+                                {"caFile", caFile()},
+                                {"wiped", _options.wiped}});
 }
 
 std::string TavrinService::statistics()
 {
     return _assembly.device.counters.openMetrics("tavrind_counter");
+}
+
+Value TavrinService::figures()
+{
+    return Value::dictionaryOf({{"requests", _assembly.requestFigures.description()}});
+}
+
+void TavrinService::waiting(platform::Reply<Value> reply)
+{
+    // Each list arrives on a queue of its own.
+    struct Lists {
+        platform::Mutex mutex;
+        platform::Dictionary lists GUARDED_BY(mutex);
+    };
+    const auto lists = std::make_shared<Lists>();
+    platform::Group all;
+    const auto take = [&](const char* name) {
+        return [lists, name, done = all.enter()](Value::Array list) {
+            const platform::MutexLock lock(lists->mutex);
+            lists->lists.set(name, std::move(list));
+        };
+    };
+    _assembly.uploadURLSession->describe(take("uploads"));
+    _assembly.downloadURLSession->describe(take("downloads"));
+    _assembly.device.activities.describe(take("activities"));
+    all.notify([lists, reply = std::move(reply)]() mutable {
+        platform::MutexLock lock(lists->mutex);
+        reply(std::move(lists->lists));
+    });
+}
+
+void TavrinService::previewUploads(platform::Reply<Value::Array> reply)
+{
+    _assembly.backgroundFlusher->previewUploads(std::move(reply));
+}
+
+void TavrinService::previewRequest(std::shared_ptr<TAVRequest> request, platform::Reply<Value, OptionalError> reply)
+{
+    const RequestKind* kind = kindOf(*request);
+    const auto current = _assembly.bagController->inMemoryBag();
+    if (!kind) return reply.abandon();
+    if (!current) return reply({}, makeTAVError(TAVErrorTimeout, "timeout"));
+    ClientConnection::completeDefaults(*request, _assembly.device);
+
+    const auto& configuration = request->configuration;
+    const std::string userAgent = configuration ? configuration->userAgent.value_or("") : "";
+    const TAVBag bag(current->rawBag(), userAgent);
+    RequestOrigins origins;
+    const ClientRequest parts{.request = *request,
+                              .bag = &bag,
+                              .userGuid = _assembly.guidController->lastKnownUserGUID(),
+                              .userAgent = userAgent,
+                              .fieldMask = fieldMaskFor(userAgent),
+                              .origins = &origins};
+    const auto built = std::invoke(kind->builder, *_assembly.requestFactory, parts);
+    if (!built) return reply({}, makeTAVError(TAVErrorInvalidResponse, "no URL"));
+
+    const auto from = [](const std::map<std::string, std::string_view>& known, const std::string& name) {
+        const auto found = known.find(name);
+        return found == known.end() ? std::string_view("user") : found->second;
+    };
+    Value::Array items, headers;
+    for (const platform::QueryItem& item : platform::UrlComponents(built->url).queryItems())
+        items.push_back(Value::dictionaryOf(
+            {{"name", item.name}, {"value", item.value.value_or("")}, {"from", from(origins.items, item.name)}}));
+    for (const auto& [name, value] : built->headers)
+        headers.push_back(
+            Value::dictionaryOf({{"name", name}, {"value", value}, {"from", from(origins.headers, name)}}));
+    reply(Value::dictionaryOf({{"method", built->method},
+                               {"url", built->url.string()},
+                               {"items", std::move(items)},
+                               {"headers", std::move(headers)}}),
+          {});
+}
+
+void TavrinService::wipe(bool settings, platform::Reply<> reply)
+{
+    if (_options.startAgainWiped) _options.startAgainWiped(settings); // returns only if it failed
+    reply();
 }
 
 } // namespace tavrin

@@ -6,6 +6,7 @@
 #include <vector>
 
 #include "CoreTavrin/TAVProtocols.h"
+#include "tavrind/Restart.h"
 
 namespace platform {
 class ProcessIdentity;
@@ -22,8 +23,8 @@ class ClientConnection;
 class TavrinService : public TAVDiagnosticsXPC, public std::enable_shared_from_this<TavrinService> {
 public:
     /// Also creates the assembly's GUID controller, session manager and flusher bridge.
-    static std::shared_ptr<TavrinService> make(Assembly& assembly);
-    explicit TavrinService(Assembly& assembly);
+    static std::shared_ptr<TavrinService> make(Assembly& assembly, StartOptions options);
+    TavrinService(Assembly& assembly, StartOptions options);
     ~TavrinService() override;
 
     /// Accepts the connection, on the connection's queue; refuses none. Run loop's thread.
@@ -39,6 +40,12 @@ public:
 
     platform::Value status() override;
     std::string statistics() override;
+    platform::Value figures() override;
+    void waiting(platform::Reply<platform::Value> reply) override;
+    void previewUploads(platform::Reply<platform::Value::Array> reply) override;
+    void previewRequest(std::shared_ptr<TAVRequest> request,
+                        platform::Reply<platform::Value, OptionalError> reply) override;
+    void wipe(bool settings, platform::Reply<> reply) override;
 
 private:
     void _accept(const std::shared_ptr<platform::ipc::Connection>& connection);
@@ -46,6 +53,7 @@ private:
                                 pid_t pid);
 
     Assembly& _assembly;
+    const StartOptions _options;
     platform::Date _started;
     std::shared_ptr<platform::Queue> _queue;
     std::vector<std::shared_ptr<ClientConnection>> _connections; // on _queue

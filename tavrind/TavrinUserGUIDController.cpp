@@ -25,6 +25,11 @@ platform::Uuid TavrinUserGUIDController::currentUserGUID()
     });
 }
 
+platform::Uuid TavrinUserGUIDController::lastKnownUserGUID()
+{
+    return _queue->sync([this] { return _lastKnownUserGUID; });
+}
+
 void TavrinUserGUIDController::reset()
 {
     _queue->async([self = shared_from_this()] { self->_rollGUID(); });

@@ -28,6 +28,8 @@ public:
 
     /// Returns the GUID, and replaces it first if it has expired.
     [[nodiscard]] platform::Uuid currentUserGUID();
+    /// Returns the GUID even if it has expired, for previews.
+    [[nodiscard]] platform::Uuid lastKnownUserGUID();
     /// Replaces the GUID before the next read.
     void reset();
 

@@ -8,11 +8,14 @@
 #include <unistd.h>
 
 #include "CoreTavrin/TAVProtocols.h"
+#include "CoreTavrin/Traces.h"
 #include "platform/base/Log.h"
 #include "platform/device/SystemDevice.h"
+#include "platform/files/Files.h"
 #include "platform/run/QueueOrder.h"
 #include "platform/run/RunLoop.h"
 #include "tavrind/DaemonOptions.h"
+#include "tavrind/Restart.h"
 #include "tavrind/Startup.h"
 
 int main(int argc, char** argv)
@@ -25,6 +28,14 @@ int main(int argc, char** argv)
                          "tavrind");
     platform::Log::threshold = options.logLevel;
 
+    bool wiped = false;
+    if (!options.wipe.empty()) {
+        const auto problems =
+            tavrin::removeTraces(platform::Directories::fromEnvironment(), options.wipe == "settings");
+        for (const std::string& problem : problems) platform::defaultLog().fault("could not be removed: {}", problem);
+        wiped = problems.empty();
+    }
+
     platform::RunLoop runLoop;
     platform::SystemDevice device(runLoop, {.service = "com.quorvane.tavrind",
                                             .sharedSuite = "com.quorvane.lookup.shared",
@@ -32,7 +43,10 @@ int main(int argc, char** argv)
                                             .notifyInterface = "com.quorvane.Notify",
                                             .etc = options.etc});
 
-    auto daemon = tavrin::startUp(device.device());
+    auto daemon = tavrin::startUp(
+        device.device(),
+        {.startAgainWiped = [argc, argv](bool settings) { tavrin::startAgainWiped(argc, argv, settings); },
+         .wiped = wiped});
     if (!daemon) {
         std::fprintf(stderr, "tavrind: %s\n", daemon.error().reason().c_str());
         _exit(EXIT_FAILURE); // skips destructors: running tasks may use the services

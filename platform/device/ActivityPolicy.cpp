@@ -6,8 +6,15 @@ namespace platform {
 
 bool criteriaHold(const ActivityCriteria& criteria, const DeviceUse& use)
 {
-    return (criteria.allowBattery || !use.onBattery) && (!criteria.requireScreenSleep || !use.screenInUse) &&
-           (!criteria.requireFirstUnlock || use.unlocked);
+    return unmetCriterion(criteria, use).empty();
+}
+
+std::string_view unmetCriterion(const ActivityCriteria& criteria, const DeviceUse& use)
+{
+    if (!criteria.allowBattery && use.onBattery) return "power";
+    if (criteria.requireScreenSleep && use.screenInUse) return "screen sleep";
+    if (criteria.requireFirstUnlock && !use.unlocked) return "first login";
+    return "";
 }
 
 bool dependOnUse(const ActivityCriteria& criteria)

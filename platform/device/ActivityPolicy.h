@@ -2,6 +2,7 @@
 
 #include <optional>
 #include <span>
+#include <string_view>
 
 #include "platform/device/ActivityScheduler.h"
 #include "platform/device/DeviceUse.h"
@@ -12,6 +13,8 @@ namespace platform {
 
 /// Returns true if an activity may run while the device is in this use.
 [[nodiscard]] bool criteriaHold(const ActivityCriteria& criteria, const DeviceUse& use);
+/// Returns the first criterion that doesn't hold: "power", "screen sleep" or "first login"; empty if all hold.
+[[nodiscard]] std::string_view unmetCriterion(const ActivityCriteria& criteria, const DeviceUse& use);
 /// Returns true if `criteriaHold` depends on the use.
 [[nodiscard]] bool dependOnUse(const ActivityCriteria& criteria);
 

@@ -122,6 +122,7 @@ public:
 
     void add(const std::string& identifier, const ActivityCriteria& criteria, ActivityScheduler::Handler handler);
     void remove(const std::string& identifier);
+    [[nodiscard]] Value::Array description();
 
 private:
     /// A registration. `_entries` is the only owner: a callback does nothing if `remove` or another registration of the
@@ -132,8 +133,9 @@ private:
         const std::shared_ptr<const ActivityScheduler::Handler> handler;
         const Duration registered;
         enum class Stage { CheckingIn, Waiting, Asking, Running } stage = Stage::CheckingIn;
-        Duration next{};        ///< due time in the stage Waiting
-        Duration gracePeriod{}; ///< how much later it may run
+        Duration next{};           ///< due time in the stage Waiting
+        Duration gracePeriod{};    ///< how much later it may run
+        std::string_view putOffBy; ///< why it did not run when it was due; empty if it ran
     };
     using WeakEntry = std::weak_ptr<Entry>;
 
@@ -248,7 +250,8 @@ void Core::_lookAt(const std::shared_ptr<Entry>& entry)
 
 void Core::_decide(const std::shared_ptr<Entry>& entry, const DeviceUse& use)
 {
-    if (criteriaHold(entry->criteria, use)) return _run(entry);
+    entry->putOffBy = unmetCriterion(entry->criteria, use);
+    if (entry->putOffBy.empty()) return _run(entry);
     _wait(*entry, _time.now() + kSoon, entry->criteria.gracePeriod);
 }
 
@@ -278,6 +281,7 @@ void Core::_run(const std::shared_ptr<Entry>& entry)
 
 void Core::_ended(Entry& entry, ActivityState how)
 {
+    entry.putOffBy = how == ActivityState::Defer ? "itself" : "";
     if (how == ActivityState::Defer) {
         _kept[entry.identifier] = _time.now() + kSoon;
         _save();
@@ -287,6 +291,22 @@ void Core::_ended(Entry& entry, ActivityState how)
     } else {
         _entries.erase(entry.identifier);
     }
+}
+
+Value::Array Core::description()
+{
+    Value::Array all;
+    for (const auto& [identifier, entry] : _entries) {
+        const bool waits = entry->stage == Entry::Stage::Waiting;
+        Dictionary activity{{"identifier", identifier},
+                            {"state", waits                                   ? "waiting"
+                                      : entry->stage == Entry::Stage::Running ? "running"
+                                                                              : "starting"}};
+        if (waits) activity.set("inSeconds", toSeconds(entry->next - _time.now()));
+        if (!entry->putOffBy.empty()) activity.set("waitsFor", entry->putOffBy);
+        all.emplace_back(std::move(activity));
+    }
+    return all;
 }
 
 // ---- the file ----
@@ -337,6 +357,10 @@ public:
     void unregister(const std::string& identifier) override
     {
         _core->onQueue([identifier](Core& core) { core.remove(identifier); });
+    }
+    void describe(std::move_only_function<void(Value::Array)> callback) override
+    {
+        _core->onQueue([callback = std::move(callback)](Core& core) mutable { callback(core.description()); });
     }
 
 private:

@@ -6,6 +6,7 @@
 #include <string>
 
 #include "platform/base/Date.h"
+#include "platform/values/Value.h"
 
 namespace platform {
 
@@ -65,6 +66,10 @@ public:
     virtual void registerActivity(const std::string& identifier, ActivityCriteria criteria, Handler handler) = 0;
     /// Removes the activity and its due time. A run in progress is not stopped.
     virtual void unregister(const std::string& identifier) = 0;
+    /// Passes a description of each activity to `callback`, on a worker: {"identifier", "state", "inSeconds" until it
+    /// is due}, and for one that was put off "waitsFor": "power", "screen sleep", "first login" or "itself". "state" is
+    /// "waiting", "running" or "starting".
+    virtual void describe(std::move_only_function<void(Value::Array)> callback) = 0;
 };
 
 /// The services that the scheduler uses. All must outlive it.

@@ -45,13 +45,14 @@ public:
     [[nodiscard]] std::optional<TaskId> next(Duration now);
     /// Returns when to call `takeExpired` and `next` again; nothing if the agenda is empty.
     [[nodiscard]] std::optional<Duration> nextDue() const;
+    /// Returns when the hold of a host ends; the smallest duration if it has none.
+    [[nodiscard]] Duration holdOf(const std::string& host, Duration now);
 
 private:
     struct Entry {
         Plan plan;
         Duration due{}; ///< key in `_dues`
     };
-    [[nodiscard]] Duration holdOf(const std::string& host, Duration now);
 
     const unsigned _maximumUnderWay;
     unsigned _underWay = 0;

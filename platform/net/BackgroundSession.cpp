@@ -17,6 +17,7 @@
 #include "platform/run/Clock.h"
 #include "platform/run/LivedTime.h"
 #include "platform/run/Queue.h"
+#include "platform/values/Dictionary.h"
 #include "platform/values/Json.h"
 
 namespace platform {
@@ -171,6 +172,18 @@ public:
         });
     }
 
+    void describe(std::move_only_function<void(Value::Array)> callback) override
+    {
+        _queue->async([self = shared_from_this(), callback = std::move(callback)]() mutable {
+            Value::Array descriptions;
+            for (const auto& [identifier, entry] : self->_entries)
+                if (!entry.stored.outcome) descriptions.push_back(self->_description(entry));
+            self->_answers->async([callback = std::move(callback), descriptions = std::move(descriptions)]() mutable {
+                callback(std::move(descriptions));
+            });
+        });
+    }
+
     // Called by tasks.
     void resume(const std::shared_ptr<Task>& task)
     {
@@ -204,6 +217,7 @@ private:
         std::shared_ptr<Task> kept; ///< null before resume
         std::shared_ptr<UrlTask> attempt;
         std::uint64_t attemptNumber = 0;
+        std::string problem; ///< of the last failed attempt
     };
 
     /// Runs `work` on the queue, unless the session has been destroyed by then.
@@ -252,6 +266,7 @@ private:
     void _stopAttempt(Entry& entry);
     void _finish(Entry& entry, std::optional<UrlResponse> response, std::optional<Error> error);
     void _report(const Entry& entry);
+    [[nodiscard]] Value _description(const Entry& entry);
     void _reported(std::uint64_t identifier);
 
     const BackgroundEnvironment _environment;
@@ -564,6 +579,7 @@ void Session::_retry(Entry& entry, const Error& error)
     const Duration delay = retryDelay(entry.stored.failures, jitter);
     defaultLog().info("background task {} will be retried in {:.0f} s: {}", entry.stored.identifier, toSeconds(delay),
                       error.description());
+    entry.problem = error.reason().empty() ? error.description() : error.reason();
     entry.stored.notBefore = _time.now() + delay;
     _save(entry);
     _schedule(entry);
@@ -597,6 +613,27 @@ void Session::_report(const Entry& entry)
         if (auto self = weak.lock())
             self->onQueue([identifier = task->identifier()](Session& session) { session._reported(identifier); });
     });
+}
+
+Value Session::_description(const Entry& entry)
+{
+    const StoredTask& task = entry.stored;
+    const Duration start = std::max(task.notBefore, _agenda.holdOf(task.request->url.host(), _time.now()));
+    const double inSeconds = toSeconds(start - _time.now());
+    Dictionary description{{"identifier", task.identifier},
+                           {"url", task.request->url.string()},
+                           {"note", task.note},
+                           {"bytes", task.bodySize},
+                           {"failures", task.failures}};
+    if (!entry.problem.empty()) description.set("problem", entry.problem);
+    if (inSeconds > 0) description.set("inSeconds", inSeconds);
+    description.set("waitsFor", !task.resumed                    ? "resume"
+                                : entry.attempt                  ? "transfer"
+                                : !_network || !_network->online ? "network"
+                                : !_mayTransfer()                ? "unmetered network"
+                                : inSeconds > 0                  ? "time"
+                                                                 : "turn");
+    return description;
 }
 
 void Session::_reported(std::uint64_t identifier)

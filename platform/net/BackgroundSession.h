@@ -101,6 +101,11 @@ public:
     /// Passes the tasks that have not ended to `callback`, which runs on a queue of the session: never inside this call
     /// and never on the delegate queue.
     virtual void getTasks(std::move_only_function<void(std::vector<std::shared_ptr<BackgroundTask>>)> callback) = 0;
+    /// Passes a description of each such task to `callback`, on the same queue: {"identifier", "url", "note", "bytes"
+    /// of an upload's body, "failures", "waitsFor"}, and if they are known "inSeconds" until its next attempt,
+    /// "problem" of the last one in this process. "waitsFor" is "resume", "network", "unmetered network", "time",
+    /// "turn" or "transfer".
+    virtual void describe(std::move_only_function<void(Value::Array)> callback) = 0;
 };
 
 /// Creates background sessions. One for each process. Any thread.

@@ -370,6 +370,7 @@ TEST_F(DownloadManagerTest, NothingOvertakesABagThatWaitsForTheListOfDownloads)
         platform::Result<Task> uploadTask(platform::UrlRequest, const std::filesystem::path&) override { return {}; }
         platform::Result<Task> downloadTask(platform::UrlRequest) override { return {}; }
         void getTasks(Answer callback) override { answers.push_back(std::move(callback)); }
+        void describe(std::move_only_function<void(Value::Array)> callback) override { callback({}); }
         std::vector<Answer> answers;
     };
     const auto slow = std::make_shared<SlowSession>();

@@ -131,5 +131,60 @@ TEST_F(BridgeTest, EachToolGetsWhatItAskedFor)
     EXPECT_EQ(signals(*bodies), Types{"FlushedData"});
 }
 
+TEST_F(BridgeTest, APreviewIsWhatLeavesByteForByte)
+{
+    begin();
+    appear();
+    report("ZRCustomFeedback", {{"feedbackType", 2}, {"jsonFeedback", Dictionary{{"domain", "example.org"}}}});
+    const auto preview = [this] {
+        Value::Array all;
+        assembly().backgroundFlusher->previewUploads(
+            platform::Reply<Value::Array>([&](Value::Array uploads) { all = std::move(uploads); }));
+        device.drain();
+        return all;
+    };
+    const Value::Array open = preview();
+    ASSERT_EQ(open.size(), 2u);
+    EXPECT_EQ(open[0]["open"], Value(true)) << "the session goes on";
+    flushSession();
+    const auto books = assembly().feedbackBooks.description();
+    const Value::Array closed = preview();
+    EXPECT_EQ(preview(), closed) << "a preview changes nothing";
+    EXPECT_EQ(assembly().feedbackBooks.description(), books);
+    ASSERT_EQ(closed.size(), 2u);
+    EXPECT_TRUE(closed[0]["open"].isNull());
+
+    upload();
+    ASSERT_EQ(uploads().size(), 2u);
+    for (std::size_t i = 0; i < closed.size(); ++i) {
+        EXPECT_EQ(closed[i]["body"].asBytes()->view(), bodyOf(*uploads()[i])) << i;
+        EXPECT_EQ(closed[i]["url"], Value(uploads()[i]->originalRequest().url.string())) << i;
+        for (const auto& [name, value] : *closed[i]["headers"].asDictionary())
+            EXPECT_EQ(*uploads()[i]->originalRequest().headers.find(name), *value.asString()) << name;
+    }
+    EXPECT_TRUE(preview().empty()) << "nothing left";
+}
+
+TEST_F(BridgeTest, AToolThatIsReplacedIsTold)
+{
+    begin();
+    const auto first = tool();
+    const auto second = tool();
+    intent(*first, 1);
+    intent(*first, 1);
+    intent(*second, 0);
+    EXPECT_TRUE(first->takePushes().empty()) << "by itself, or in another role";
+    intent(*second, 1);
+    const auto pushes = first->takePushes();
+    ASSERT_EQ(pushes.size(), 1u);
+    EXPECT_EQ(pushes[0].signal, "Replaced");
+    EXPECT_EQ(pushes[0].message.args, (std::vector<Value>{Value(1u), Value(second->peer().pid)}));
+    const Value pid(second->peer().pid);
+    EXPECT_EQ(assembly().flusherXPCListener->watchers(), Value(Dictionary{{"events", pid}, {"flushes", pid}}));
+    second->end();
+    device.drain();
+    EXPECT_EQ(assembly().flusherXPCListener->watchers(), Value(Dictionary()));
+}
+
 } // namespace
 } // namespace tavrin::test

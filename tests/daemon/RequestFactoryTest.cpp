@@ -78,6 +78,47 @@ std::set<std::string> contents(const UrlRequest& request)
     return all;
 }
 
+TEST_F(RequestFactoryTest, APreviewSaysWhereEachPartComesFrom)
+{
+    device.userDefaults.set("TAVDebugParameters", "debug=1");
+    factory = TAVNetworkRequestFactory::make(assembly);
+    device.drain();
+    knowEverything();
+    bag = bagOf(R"({"searchURL": "https://s.example/search?tier=2&units=Metric"})");
+    const auto search = TAVSearchRequest::searchRequestWithString("weat", StartSearchTrigger::Suggestion);
+    search->scale = 2;
+    search->queryItems = {std::make_shared<TAVQueryItem>("own", "1")};
+    RequestOrigins origins;
+    ClientRequest client = of(*search);
+    const UrlRequest sent = *factory->searchRequest(client);
+    const int updates = device.location.updatesRequested;
+    client.origins = &origins;
+    EXPECT_EQ(contents(*factory->searchRequest(client)), contents(sent)) << "the preview is the request";
+    EXPECT_EQ(device.location.updatesRequested, updates) << "it asks for no location";
+
+    const std::map<std::string_view, std::string_view> items{{"tier", "bag"},
+                                                             {"units", "bag"},
+                                                             {"q", "user"},
+                                                             {"qtype", "default"},
+                                                             {"own", "user"},
+                                                             {"debug", "settings"},
+                                                             {"key", "default"},
+                                                             {"card", "default"},
+                                                             {"locale", "device"},
+                                                             {"latlng", "device"},
+                                                             {"X-Quorvane-UserGuid", "device"},
+                                                             {"User-Agent", "client"},
+                                                             {"X-Quorvane-UI-Scale", "user"}};
+    for (const auto& [name, from] : items) {
+        const auto& known = name.starts_with("X-") || name == "User-Agent" ? origins.headers : origins.items;
+        const auto found = known.find(std::string(name));
+        EXPECT_EQ(found == known.end() ? "" : found->second, from) << name;
+    }
+    for (const auto& item : UrlComponents(sent.url).queryItems())
+        EXPECT_TRUE(origins.items.contains(item.name)) << item.name;
+    for (const auto& [name, value] : sent.headers) EXPECT_TRUE(origins.headers.contains(name)) << name;
+}
+
 // Every recipe against the table: a row names the kinds that have it, by letter. The field mask hides the place and the
 // applications of three kinds.
 TEST_F(RequestFactoryTest, EveryKindCarriesItsColumnOfTheTable)

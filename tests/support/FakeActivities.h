@@ -45,6 +45,7 @@ public:
         registered[identifier] = {checkIn->criteria(), std::move(handler)};
     }
     void unregister(const std::string& identifier) override { registered.erase(identifier); }
+    void describe(std::move_only_function<void(Value::Array)> callback) override { callback({}); }
 
     /// Calls the handler of an activity as the scheduler does when it is due.
     std::shared_ptr<Run> run(const std::string& identifier, bool refuse = false)
