@@ -227,7 +227,7 @@ std::vector<Row> archive()
                     });
                 }),
             compare(
-                "decoding it, beside MessagePack's unpacker", 9, 2,
+                "decoding it, beside MessagePack's unpacker", 9, 1.7,
                 [&] {
                     return cpuOfEach(kCalls, [&] {
                         require(platform::unarchive(bytes, tavrindRecordClasses()).has_value(), "unarchive");

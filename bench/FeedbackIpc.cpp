@@ -112,7 +112,7 @@ std::vector<Row> events()
     for (int i = 0; i < kClients; ++i)
         clients.push_back(TAVClient::connect("unix:path=" + (directory / "socket").string()).value());
     return {compare(
-        "events of 8 clients into their sessions, CPU an event, beside a server that decodes them", 7, 2,
+        "events of 8 clients into their sessions, CPU an event, beside a server that decodes them", 7, 1.7,
         [&] { return daemon.cpuOfEvents(kEvents); },
         [&] {
             const double begin = cpu(server.pid());

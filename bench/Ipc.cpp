@@ -26,7 +26,7 @@ std::vector<Row> ipc()
     Echo echo(daemon.sizesOf(listSessions));
     const auto client = daemon.client();
     return {compare(
-        "`ListSessions` over IPC, beside a socket echo of as many bytes, on one core", 9, 3.5,
+        "`ListSessions` over IPC, beside a socket echo of as many bytes, on one core", 9, 2.5,
         [&] {
             const double begin = now();
             for (int i = 0; i < kCalls; ++i) listSessions(*client);

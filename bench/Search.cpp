@@ -41,11 +41,11 @@ std::vector<Row> search()
     };
     std::vector<Row> rows;
     rows.push_back(compare(
-        "search, 60 KB answer, beside libcurl and simdjson", 9, 2, [&] { return run(500, ours); },
+        "search, 60 KB answer, beside libcurl and simdjson", 9, 1.8, [&] { return run(500, ours); },
         [&] { return run(500, [&] { plain.request(url); }); }));
     service.setDelay(0.02);
     rows.push_back(compare(
-        "the same with 20 ms of service delay", 5, 1.05, [&] { return run(50, ours); },
+        "the same with 20 ms of service delay", 5, 1.03, [&] { return run(50, ours); },
         [&] { return run(50, [&] { plain.request(url); }); }));
     return rows;
 }
