@@ -82,7 +82,8 @@ TEST(LineEditor, TellsWhatAKeyMeans)
 
 TEST(SearchScreen, FitsAnyWindow)
 {
-    SearchView view{"", 0, std::vector<ScreenLine>(40, {"result"}), 0, std::vector<std::string>(20, "key")};
+    SearchView view{"", 0, std::vector<ScreenLine>(40, {"result"}), 0,
+                    std::vector<KeyLine>(20, {"\"key\"", "cache          0.3 ms", "3 results, 1 set"})};
     view.text = "東京タワー " + std::string(300, 'x') + "éé";
     for (view.cursor = 0; view.cursor <= view.text.size(); view.cursor += view.text.size() / 4)
         for (int columns = 1; columns < 100; columns += 3)
@@ -101,15 +102,27 @@ TEST(SearchScreen, ShowsTheNewestKeysAndAsMuchOfTheAnswerAsFits)
 {
     SearchView view{"weather", 7, {}, 0, {}};
     for (int i = 0; i < 40; ++i) view.answer.push_back({"result " + std::to_string(i)});
-    for (int i = 0; i < 20; ++i) view.keys.push_back("key " + std::to_string(i));
+    for (int i = 0; i < 20; ++i) view.keys.push_back({"key " + std::to_string(i), "…", ""});
     const auto row = [&](std::size_t number, int rows = 24) { return layOut(view, {80, rows}).lines.at(number).text; };
-    for (const auto& [number, text] :
-         {std::pair(0, "Search: weather"), {2, "result 0"}, {15, "  … 27 more lines"}, {17, "key 14"}, {22, "key 19"}})
+    for (const auto& [number, text] : {std::pair(0, "Search: weather"),
+                                       {2, "result 0"},
+                                       {15, "  … 27 more lines"},
+                                       {17, "key 14                    …  "},
+                                       {22, "key 19                    …  "}})
         EXPECT_EQ(row(number), text);
     EXPECT_EQ(row(1, 2), "  … 40 more lines");
     EXPECT_TRUE(drawn(layOut(view, {80, 24}), false).contains("\033[1;16H")) << "the cursor is behind the text";
     view.scrolled = view.answer.size() - answerRows(view.keys.size(), {80, 24});
     EXPECT_EQ(row(15), "result 39") << "the last line of all";
+}
+
+TEST(SearchScreen, ANarrowWindowKeepsOutcomesAndTheWayOut)
+{
+    const KeyLine key{"\"weather tomorrow\"", "network       12.3 ms", "3 results, 1 set"};
+    const SearchView view{"weather tomorrow", 16, {}, 0, {key}};
+    const ScreenFrame frame = layOut(view, {40, 24});
+    EXPECT_EQ(frame.lines.at(22).text, "\"weather tomorro…  network       12.3 ms");
+    EXPECT_TRUE(frame.lines.at(23).text.starts_with("Ctrl-C ends")) << frame.lines.at(23).text;
 }
 
 } // namespace

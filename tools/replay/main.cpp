@@ -18,6 +18,7 @@
 #include "platform/values/Json.h"
 #include "tools/replay/Corpus.h"
 #include "tools/replay/Report.h"
+#include "tools/shared/CommandLine.h"
 
 namespace tavrin::replay {
 
@@ -140,24 +141,35 @@ int run(const Options& options)
 int main(int argc, char** argv)
 {
     using namespace tavrin::replay;
+    namespace tools = tavrin::tools;
     Options options;
     CLI::App app(
         "Types a corpus of queries into the daemon, key by key, and reports hits, requests saved, stale answers and "
         "latencies. The exit status is 1 if an answer was stale or failed.");
     app.set_version_flag("--version", "tavrin-replay " TAVRIND_VERSION);
+    tools::useReadableHelp(app);
     app.add_option("corpus", options.corpus, "Corpus file in the form of tools/replay/corpus.txt")->required();
-    app.add_option("--address", options.address, "The daemon's D-Bus address")->capture_default_str();
-    app.add_option("--identifier", options.identifier, "Client identifier to connect as")->capture_default_str();
-    CLI::Option* speed = app.add_option("--speed", options.speed, "Factor on the speed of the users")
-                             ->check(CLI::Range(0.01, 100000.0))
-                             ->capture_default_str();
+    app.add_option("--address", options.address, "The daemon's D-Bus address")
+        ->type_name("ADDRESS")
+        ->capture_default_str();
+    app.add_option("--identifier", options.identifier, "Client identifier to connect as")
+        ->type_name("NAME")
+        ->capture_default_str();
+    CLI::Option* speed =
+        app.add_option("--speed", options.speed, "Factor on the speed of the users")->capture_default_str();
+    tools::takesNumber(speed, "FACTOR", 0.01, 100000);
     app.add_flag("--lockstep", options.lockstep, "Type each key as soon as the previous one is answered")
         ->excludes(speed);
-    app.add_option("-n,--queries", options.queries, "Number of queries to type; 0 types all");
-    app.add_option("--timeout", options.timeout, "Seconds to wait for an answer")
-        ->check(CLI::Range(0.001, 86400.0))
-        ->capture_default_str();
+    tools::takesWholeNumber(app.add_option("-n,--queries", options.queries, "Queries to type; 0 types all"), "COUNT", 0,
+                            1e9);
+    tools::takesNumber(app.add_option("--timeout", options.timeout, "How long to wait for an answer, in seconds")
+                           ->capture_default_str(),
+                       "SECONDS", 0.001, 86400);
     app.add_flag("--json", options.json, "Print JSON");
-    CLI11_PARSE(app, argc, argv);
+    try {
+        app.parse(argc, argv);
+    } catch (const CLI::ParseError& error) {
+        return tools::endOfParsing(app, error, "tavrin-replay");
+    }
     return run(options);
 }

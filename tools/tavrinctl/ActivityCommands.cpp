@@ -146,20 +146,25 @@ void addActivityCommands(CLI::App& app, Command& chosen)
     activity->require_subcommand(1);
 
     CLI::App* adding = activity->add_subcommand("add", "Report an activity as an application does");
-    adding->add_option("--app", options->app, "The application's identifier, org.example.News")->required();
-    adding->add_option("--url", options->url, "URL of the content");
-    adding->add_option("--identifier", options->identifier, "Unique identifier of the content within the application");
+    adding->add_option("--app", options->app, "The application's identifier, org.example.News")
+        ->type_name("ID")
+        ->required();
+    adding->add_option("--url", options->url, "URL of the content")->type_name("URL");
+    adding->add_option("--identifier", options->identifier, "Unique identifier of the content within the application")
+        ->type_name("ID");
     adding->add_flag(
         "--public,!--not-public", options->isPublic,
         "Whether everyone may see the content; the daemon records only public activities. Default: not public");
-    adding->add_option(
-        "--at", options->at,
-        "Start of the activity: 2026-01-31T12:00 (UTC with a final \"Z\") or seconds since 1970; default: now");
+    adding
+        ->add_option(
+            "--at", options->at,
+            "Start of the activity: 2026-01-31T12:00 (UTC with a final \"Z\") or seconds since 1970; default: now")
+        ->type_name("TIME");
     adding->footer("The daemon records activities twice a day, while the device is not in use.");
     adding->callback([&chosen, options] { chosen = [options](const Options& common) { add(common, *options); }; });
 
     activity->add_subcommand("list", "List the activities of the last days, the latest last; at most --limit")
-        ->callback([&chosen] { chosen = listActivities; });
+        ->callback([&chosen] { chosen = paged(listActivities); });
 }
 
 } // namespace tavrin::ctl

@@ -15,6 +15,17 @@ namespace tavrin::ctl {
 
 /// Runs a command after the command line was parsed. Throws `Failure`.
 using Command = std::function<void(const Options&)>;
+/// Returns the command with its output in a pager.
+template <class Action> Command paged(Action action)
+{
+    return [action](const Options& options) {
+        pageOutput();
+        action(options);
+    };
+}
+
+/// Adds --item, which takes one NAME=VALUE each time.
+void addItemOption(CLI::App& command, std::vector<std::string>& items);
 
 void addSearchCommand(CLI::App& app, Command& chosen);
 /// zkw, more, card, lookup, flight and warm.
@@ -33,6 +44,14 @@ void addFeedbackCommands(CLI::App& app, Command& chosen);
 void addSessionCommand(CLI::App& app, Command& chosen);
 /// defaults read, write, delete and list.
 void addDefaultsCommands(CLI::App& app, Command& chosen);
+/// doctor.
+void addDoctorCommand(CLI::App& app, Command& chosen);
+/// preview uploads and search.
+void addPreviewCommand(CLI::App& app, Command& chosen);
+/// wipe.
+void addWipeCommand(CLI::App& app, Command& chosen);
+/// top.
+void addTopCommand(CLI::App& app, Command& chosen);
 /// activity add and list.
 void addActivityCommands(CLI::App& app, Command& chosen);
 

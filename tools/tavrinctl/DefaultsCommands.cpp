@@ -1,17 +1,17 @@
 // tavrinctl defaults: the daemon's settings file, which the daemon watches. Needs no daemon.
 
-#include <algorithm>
-#include <array>
-
 #include <CLI/CLI.hpp>
 #include <fmt/format.h>
 
+#include "CoreTavrin/TAVSettings.h"
 #include "platform/base/Log.h"
 #include "platform/files/Files.h"
 #include "platform/files/UserDefaults.h"
 #include "platform/values/Dictionary.h"
 #include "platform/values/Json.h"
+#include "tools/tavrinctl/Characters.h"
 #include "tools/tavrinctl/Commands.h"
+#include "tools/tavrinctl/Settings.h"
 
 namespace tavrin::ctl {
 
@@ -21,25 +21,7 @@ using platform::Value;
 namespace {
 
 constexpr std::size_t kMaximumFileSize = 4u << 20;
-
-struct KnownKey {
-    std::string_view key;
-    std::string_view type;
-    std::string_view effect;
-};
-constexpr std::array kKnownKeys{
-    KnownKey{"TAVBagURL", "string", "where the bag is fetched from"},
-    KnownKey{"TAVSharedSession", "boolean", "all clients share one session; read at start"},
-    KnownKey{"TAVSessionSizeLimit", "number", "bytes of a session file; read at start"},
-    KnownKey{"TAVSessionMaxAge", "number", "seconds that a session file is kept; read at start"},
-    KnownKey{"TAVPersistSessions", "boolean", "known clients survive a restart; read at start"},
-    KnownKey{"TAVNoQueryCache", "boolean", "no answers from memory"},
-    KnownKey{"TAVNoParallax", "boolean", "no TCP Fast Open, no TLS session tickets; read at start"},
-    KnownKey{"TAVDebugParameters", "string", "name=value&… for every request; read at start"},
-    KnownKey{"TAVLogPrivateData", "boolean", "the log shows what users typed and saw; read at start"},
-    KnownKey{"TAVDownloadDelay", "number", "seconds until a resource is downloaded; for development"},
-    KnownKey{"TraceEnabled", "boolean", "trace points; read at start"},
-};
+constexpr std::string_view kDaemonSuite = "com.quorvane.tavrind";
 
 std::filesystem::path settingsFile(const std::string& suite)
 {
@@ -72,22 +54,14 @@ Dictionary change(const std::filesystem::path& path, const std::string& key, con
     return settings.contents();
 }
 
-bool fits(const Value& value, std::string_view type)
+/// Tells the user what to know about a change. The settings of another program are not known here.
+void tellAbout(const std::string& suite, const std::string& key)
 {
-    if (type == "boolean") return value.type() == Value::Type::Bool;
-    if (type == "number") return value.asInt() && *value.asInt() >= 0;
-    return value.asString() != nullptr;
-}
-
-/// Parses the typed value as JSON. Uses it as a string if it is not JSON, or if the key is known to be a string.
-Value settingValue(const std::string& key, const std::string& typed)
-{
-    const auto known = std::ranges::find(kKnownKeys, key, &KnownKey::key);
-    if (known != kKnownKeys.end() && known->type == "string") return typed;
-    Value value = platform::parseJson(typed).value_or(Value(typed));
-    if (known != kKnownKeys.end() && !fits(value, known->type))
-        throw Failure(fmt::format("{} takes a {}, not \"{}\"", key, known->type, typed), 2);
-    return value;
+    if (suite != kDaemonSuite) return;
+    if (const std::string note = noteOnChange(key); !note.empty()) {
+        endProgress();
+        fmt::print(stderr, "tavrinctl: {}\n", printable(note));
+    }
 }
 
 void read(const Options& options, const std::string& suite, const std::string& key)
@@ -111,16 +85,21 @@ void listDefaults(const Options& options)
 {
     if (options.json) {
         Value::Array keys;
-        for (const KnownKey& known : kKnownKeys)
-            keys.push_back(Value::dictionaryOf({{"key", known.key}, {"type", known.type}, {"effect", known.effect}}));
+        for (const KnownSetting& known : knownSettings())
+            keys.push_back(Value::dictionaryOf({{"key", known.key},
+                                                {"type", known.type},
+                                                {"effect", known.effect},
+                                                {"read", known.read},
+                                                {"writtenByDaemon", known.isDaemons}}));
         return printJson(keys);
     }
-    for (const KnownKey& known : kKnownKeys)
-        printLine(fmt::format("{:<20} {:<8} {}", known.key, known.type, known.effect));
+    for (const KnownSetting& known : knownSettings())
+        printLine(fmt::format("{} {:<8} {}; {}", padded(known.key, 25), known.type, known.effect,
+                              known.isDaemons ? "written by the daemon" : fmt::format("read {}", known.read)));
 }
 
 struct DefaultsOptions {
-    std::string suite = "com.quorvane.tavrind";
+    std::string suite{kDaemonSuite};
     std::string key, value;
 };
 
@@ -133,7 +112,9 @@ void addDefaultsCommands(CLI::App& app, Command& chosen)
     defaults->require_subcommand(1);
     const auto add = [&](const char* name, const char* description, auto action) {
         CLI::App* command = defaults->add_subcommand(name, description);
-        command->add_option("--suite", options->suite, "Program whose settings to use")->capture_default_str();
+        command->add_option("--suite", options->suite, "Program whose settings to use")
+            ->type_name("NAME")
+            ->capture_default_str();
         command->callback([&chosen, action, options] {
             chosen = [action, options](const Options& common) { action(common, *options); };
         });
@@ -141,16 +122,18 @@ void addDefaultsCommands(CLI::App& app, Command& chosen)
     };
 
     add("read", "Print one setting, or all that are set", [](const Options& common, const DefaultsOptions& mine) {
+        pageOutput();
         read(common, mine.suite, mine.key);
     })->add_option("key", options->key, "Name of the setting");
 
-    CLI::App* write = add("write", "Change a setting; the daemon applies it at once",
+    CLI::App* write = add("write", "Change a setting, and say when the daemon applies it",
                           [](const Options& common, const DefaultsOptions& mine) {
                               const auto path = settingsFile(mine.suite);
                               (void)readSettings(path); // never overwrites a broken file
                               const Value value = settingValue(mine.key, mine.value);
                               change(path, mine.key, value);
                               if (common.json) printJson(Value::dictionaryOf({{mine.key, value}}));
+                              tellAbout(mine.suite, mine.key);
                           });
     write->add_option("key", options->key, "Name of the setting")->required();
     write->add_option("value", options->value, "JSON, or plain text")->required();
@@ -161,12 +144,15 @@ void addDefaultsCommands(CLI::App& app, Command& chosen)
             if (!readSettings(path).contains(mine.key)) throw Failure(fmt::format("{} is not set", mine.key));
             const Dictionary settings = change(path, mine.key, Value());
             if (common.json) printJson(settings);
+            if (knownSetting(mine.key)) tellAbout(mine.suite, mine.key);
         })
         ->add_option("key", options->key, "Name of the setting")
         ->required();
 
-    add("list", "List the settings and their effects",
-        [](const Options& common, const DefaultsOptions&) { listDefaults(common); });
+    add("list", "List the settings and their effects", [](const Options& common, const DefaultsOptions&) {
+        pageOutput();
+        listDefaults(common);
+    });
 }
 
 } // namespace tavrin::ctl

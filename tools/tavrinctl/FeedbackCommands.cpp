@@ -43,6 +43,7 @@ class, and the "queryId" that it belongs to. Enumerations are numbers. Nothing i
 std::string contents(const std::string& file)
 {
     if (file == "-") {
+        endProgress(); // the user may type the events
         std::string text;
         std::array<char, 1u << 16> piece;
         while (text.size() <= kMaximumEventsFile && std::cin.read(piece.data(), piece.size()).gcount() > 0)
@@ -137,7 +138,7 @@ void addFeedbackCommands(CLI::App& app, Command& chosen)
     feedback->require_subcommand(0, 1);
     // Runs after the callbacks of its subcommands.
     feedback->callback([&chosen, feedback] {
-        if (feedback->get_subcommands().empty()) chosen = listEvents;
+        if (feedback->get_subcommands().empty()) chosen = paged(listEvents);
     });
 
     CLI::App* sendCommand = feedback->add_subcommand("send", "Report events as a client does");
@@ -146,7 +147,7 @@ void addFeedbackCommands(CLI::App& app, Command& chosen)
     sendCommand->footer(kExamples);
     sendCommand->callback([&chosen, file] { chosen = [file](const Options& options) { send(options, *file); }; });
     feedback->add_subcommand("records", "List the classes of records that can be reported, with their fields")
-        ->callback([&chosen] { chosen = listRecords; });
+        ->callback([&chosen] { chosen = paged(listRecords); });
 }
 
 } // namespace tavrin::ctl

@@ -1,11 +1,8 @@
 // tavrinctl watch, flush: follow and control the feedback pipeline.
 
-#include <array>
 #include <chrono>
-#include <csignal>
 #include <cstdio>
 #include <filesystem>
-#include <unistd.h>
 
 #include <CLI/CLI.hpp>
 #include <fmt/chrono.h>
@@ -14,6 +11,7 @@
 #include "CoreTavrin/TAVProtocols.h"
 #include "platform/files/Files.h"
 #include "platform/values/Json.h"
+#include "tools/shared/CommandLine.h"
 #include "tools/tavrinctl/Commands.h"
 #include "tools/tavrinctl/Events.h"
 
@@ -28,10 +26,12 @@ struct Listener final : TAVFlusherListener {
     std::function<void(const platform::Bytes&)> onFlushedData = [](const platform::Bytes&) {};
     std::function<void(const std::string&)> onEvent = [](const std::string&) {};
     bool done = false;
+    std::optional<std::int64_t> successor; ///< the process that has taken over
 
     void flushedData(const platform::Bytes& body) override { onFlushedData(body); }
     void receivedFeedbackDescription(const std::string& description) override { onEvent(description); }
     void workDone() override { done = true; }
+    void replaced(FlusherIntent, std::int64_t process) override { successor = process; }
 };
 
 /// A connection to the diagnostic bridge, and the client session that it was requested through.
@@ -51,22 +51,12 @@ struct Bridge {
     }
 };
 
-/// Makes SIGINT and SIGTERM end the program with status 0, because watching has no other end.
-void endOnSignal()
-{
-    static std::array<char, 1u << 20> buffer; // one write per line, which no signal interrupts
-    std::setvbuf(stdout, buffer.data(), _IOFBF, buffer.size());
-    struct sigaction action{};
-    action.sa_handler = [](int) { _exit(EXIT_SUCCESS); };
-    for (const int signal : {SIGINT, SIGTERM}) sigaction(signal, &action, nullptr);
-}
-
 /// Shows what the bridge sends until `count` items were shown.
 class Watch {
 public:
-    /// 0 for `count` means no limit. `what` tells the user what follows.
-    Watch(const Options& options, std::uint64_t count, std::string_view what)
-        : _options(options), _count(count), _what(what)
+    /// 0 for `count` means no limit. `what` is watched.
+    Watch(const Options& options, std::uint64_t count, FlusherIntent what)
+        : _options(options), _count(count), _intent(what)
     {}
 
     /// Counts one more item. Returns false if the limit is reached.
@@ -77,13 +67,18 @@ public:
         ++_seen;
         return true;
     }
-    void run(Bridge& bridge, FlusherIntent intent)
+    void run(Bridge& bridge, const Listener& listener)
     {
         endOnSignal();
-        bridge.initiate(intent);
+        const bool events = _intent == FlusherIntent::WatchEvents;
+        _predecessor = valueOf(bridge.session.client->status())["watchers"][events ? "events" : "flushes"].asInt();
+        bridge.initiate(_intent);
         tellAttached();
-        if (!bridge.client->wait([this] { return full(); }, platform::Duration::max()))
+        if (!bridge.client->wait([&] { return full() || listener.successor; }, platform::Duration::max()))
             throw Failure("the daemon closed the connection");
+        if (!full())
+            throw Failure(fmt::format("process {} watches {} now, and only one tool can", *listener.successor,
+                                      events ? "events" : "flushes"));
     }
 
 private:
@@ -92,15 +87,19 @@ private:
     void tellAttached()
     {
         if (std::exchange(_told, true)) return;
-        if (_options.json)
-            fmt::print(stderr, "{}\n", R"({"attached":true})");
-        else
-            fmt::print(stderr, "Attached: {}. Press Ctrl-C to end.\n", _what);
+        endProgress();
+        if (_options.json) return fmt::print(stderr, "{}\n", R"({"attached":true})");
+        if (_predecessor)
+            fmt::print(stderr, "Process {} was watching, and receives nothing more: only one tool can.\n",
+                       *_predecessor);
+        fmt::print(stderr, "Attached: showing every {} from now on. Press Ctrl-C to end.\n",
+                   _intent == FlusherIntent::WatchEvents ? "event" : "body that is flushed");
     }
 
     const Options& _options;
     const std::uint64_t _count;
-    const std::string_view _what;
+    const FlusherIntent _intent;
+    std::optional<std::int64_t> _predecessor; ///< the process that watched before
     std::uint64_t _seen = 0;
     bool _told = false;
 };
@@ -115,7 +114,7 @@ std::string timeOfDay()
 
 void watchEvents(const Options& options, std::uint64_t count)
 {
-    Watch watch(options, count, "showing every event from now on");
+    Watch watch(options, count, FlusherIntent::WatchEvents);
     Listener listener;
     listener.onEvent = [&](const std::string& description) {
         if (!watch.takes()) return;
@@ -124,7 +123,7 @@ void watchEvents(const Options& options, std::uint64_t count)
         printLine(dim(timeOfDay()) + "  " + (event ? eventLine(*event) : printable(description)));
     };
     Bridge bridge(options, listener);
-    watch.run(bridge, FlusherIntent::WatchEvents);
+    watch.run(bridge, listener);
 }
 
 void showBody(const Options& options, const FlushedBody& body)
@@ -134,13 +133,13 @@ void showBody(const Options& options, const FlushedBody& body)
 
 void watchFlushes(const Options& options, std::uint64_t count)
 {
-    Watch watch(options, count, "showing every body that is flushed from now on");
+    Watch watch(options, count, FlusherIntent::WatchFlushes);
     Listener listener;
     listener.onFlushedData = [&](const platform::Bytes& packed) {
         if (watch.takes()) showBody(options, flushedBody(packed));
     };
     Bridge bridge(options, listener);
-    watch.run(bridge, FlusherIntent::WatchFlushes);
+    watch.run(bridge, listener);
 }
 
 /// Sends a command to the bridge and waits until it is done. Throws `Failure` on a time-out.
@@ -211,7 +210,9 @@ void addFlusherCommands(CLI::App& app, Command& chosen)
 {
     const auto countOf = [](CLI::App* command) {
         auto count = std::make_shared<std::uint64_t>(0);
-        command->add_option("--count", *count, "End after this many; 0 never ends")->capture_default_str();
+        tools::takesWholeNumber(
+            command->add_option("--count", *count, "End after this many; 0 never ends")->capture_default_str(), "COUNT",
+            0, 1e15);
         return count;
     };
 
@@ -233,7 +234,8 @@ void addFlusherCommands(CLI::App& app, Command& chosen)
     });
     CLI::App* flushDump = flush->add_subcommand("dump", "End all sessions, flush them now and show the bodies");
     auto directory = std::make_shared<std::string>();
-    flushDump->add_option("-o,--output", *directory, "Directory to save the bodies to, as flushed-N.json");
+    flushDump->add_option("-o,--output", *directory, "Directory to save the bodies to, as flushed-N.json")
+        ->type_name("DIRECTORY");
     flushDump->callback(
         [&chosen, directory] { chosen = [directory](const Options& options) { dump(options, *directory); }; });
 }

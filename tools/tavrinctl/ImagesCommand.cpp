@@ -12,6 +12,7 @@
 #include "platform/files/Files.h"
 #include "platform/values/Dictionary.h"
 #include "platform/values/Json.h"
+#include "tools/shared/CommandLine.h"
 #include "tools/tavrinctl/Commands.h"
 #include "tools/tavrinctl/ImageFiles.h"
 #include "tools/tavrinctl/RequestRunner.h"
@@ -145,17 +146,23 @@ void addImagesCommand(CLI::App& app, Command& chosen)
     auto options = std::make_shared<ImagesOptions>();
     CLI::App* command = app.add_subcommand("images", "Save the images of an answer");
     command->add_option("query", options->query, "What to search for");
-    command->add_option("--url", options->urls, "URL of an image; may be repeated");
-    command->add_option("--id", options->identifiers,
-                        "Identifier of an image, which the bag maps to a URL; may be repeated");
+    command->add_option("--url", options->urls, "URL of an image; may be repeated")
+        ->type_name("URL")
+        ->allow_extra_args(false);
+    command
+        ->add_option("--id", options->identifiers,
+                     "Identifier of an image, which the bag maps to a URL; may be repeated")
+        ->type_name("ID")
+        ->allow_extra_args(false);
     command->add_option("-o,--output", options->directory, "Directory to save to; existing files are never overwritten")
+        ->type_name("DIRECTORY")
         ->capture_default_str();
-    command->add_option("--within", options->within, "Seconds to wait for the images")
-        ->check(CLI::Range(0.0, 60.0))
-        ->capture_default_str();
+    tools::takesNumber(command->add_option("--within", options->within, "How long to wait for the images, in seconds")
+                           ->capture_default_str(),
+                       "SECONDS", 0, 60);
     command->callback([options, &chosen] {
         if (options->query.empty() && options->urls.empty() && options->identifiers.empty())
-            throw CLI::RequiredError("query, --url or --id");
+            throw CLI::ValidationError("give a query, --url or --id");
         chosen = [options](const Options& common) { loadImages(common, *options); };
     });
 }

@@ -1,18 +1,17 @@
 // tavrinctl bag, sessions, status, stats: show the daemon's state.
 
 #include <charconv>
-#include <cmath>
-#include <utility>
+#include <unistd.h>
 
 #include <CLI/CLI.hpp>
-#include <fmt/chrono.h>
 #include <fmt/format.h>
 
 #include "CoreTavrin/TAVBag.h"
 #include "platform/values/Dictionary.h"
 #include "platform/values/Json.h"
-#include "tools/tavrinctl/Books.h"
+#include "tools/shared/CommandLine.h"
 #include "tools/tavrinctl/Commands.h"
+#include "tools/tavrinctl/StatusText.h"
 
 namespace tavrin::ctl {
 
@@ -27,17 +26,6 @@ std::string text(const Value& value)
     return string ? printable(*string) : platform::toJson(value);
 }
 
-/// Formats a time span: "3 d 4 h", "2 min 5 s", "17 s"; with a minus sign if negative.
-std::string span(double seconds)
-{
-    const auto total = static_cast<std::int64_t>(std::min(std::abs(seconds), 1e15));
-    const std::string sign = seconds < 0 ? "-" : "";
-    if (total >= 86400) return fmt::format("{}{} d {} h", sign, total / 86400, total / 3600 % 24);
-    if (total >= 3600) return fmt::format("{}{} h {} min", sign, total / 3600, total / 60 % 60);
-    if (total >= 60) return fmt::format("{}{} min {} s", sign, total / 60, total % 60);
-    return fmt::format("{}{} s", sign, total);
-}
-
 void row(const std::string& name, const std::string& value)
 {
     printLine(fmt::format("{:<18} {}", name, value));
@@ -50,12 +38,13 @@ std::string urlText(const std::optional<platform::Url>& url)
 
 void showBag(const Options& options)
 {
-    const TAVBagAnswer answer = valueOf(openSession(options).client->bag());
+    const Session session = openSession(options);
+    const TAVBagAnswer answer = valueOf(session.client->bag());
     if (options.json) {
         Dictionary description;
         if (answer.bag) {
             Value::Array problems;
-            for (std::string& problem : answer.bag->problems()) problems.emplace_back(std::move(problem));
+            for (std::string& problem : bagProblems(*answer.bag)) problems.emplace_back(std::move(problem));
             description.set("bag", answer.bag->rawBag());
             description.set("userAgent", answer.bag->userAgent());
             description.set("problems", std::move(problems));
@@ -72,12 +61,15 @@ void showBag(const Options& options)
         row("warm-up URL", urlText(bag.warmURL()));
         row("flight URL", urlText(bag.flightURL()));
         row("feedback URL", urlText(bag.feedbackURL()));
-        for (const std::string& problem : bag.problems()) row("problem", printable(problem));
+        row("crowdsourcing URL", urlText(bag.crowdsourcingURL()));
+        row("image URL", bag.imageURL() ? printable(*bag.imageURL()) : "none");
+        for (const std::string& problem : bagProblems(bag)) row("problem", printable(problem));
         printLine(dim("as " + printable(bag.userAgent()) + " sees it; --json shows every key"));
     }
-    if (!answer.bag)
-        throw Failure(fmt::format("the daemon has no bag ({}).\nCheck its URL: tavrinctl defaults read TAVBagURL",
-                                  answer.error ? answer.error->reason() : "no reason given"));
+    if (answer.bag) return;
+    std::string cause = lastFetchText(valueOf(session.client->status())["bag"]);
+    if (cause.empty()) cause = answer.error ? answer.error->reason() : "no reason given";
+    throw Failure(fmt::format("the daemon has no bag ({}).\n\"tavrinctl doctor\" says what to do.", printable(cause)));
 }
 
 void showSessions(const Options& options)
@@ -89,40 +81,24 @@ void showSessions(const Options& options)
         printLine(fmt::format("{:<36} {}", text(session["identifier"]), text(session["agent"])));
 }
 
-void showStatus(const Options& options)
+void printStatus(const Options& options, const Value& status)
 {
-    const Value status = valueOf(connect(options)->status());
     if (options.json) return printJson(status);
-    row("daemon", fmt::format("{}, process {}, up for {}", text(status["version"]), text(status["pid"]),
-                              span(status["uptime"].asDouble().value_or(0))));
-    const Value& bag = status["bag"];
-    std::string bagText = "none";
-    if (!bag["version"].isNull()) {
-        bagText =
-            fmt::format("version {}, search {}", text(bag["version"]), bag["enabled"] == Value(true) ? "on" : "off");
-        if (const auto expiresIn = bag["expiresIn"].asDouble())
-            bagText += *expiresIn > 0 ? ", fresh for " + span(*expiresIn) : ", stale since " + span(-*expiresIn);
-    }
-    if (bag["fetchInProgress"] == Value(true)) bagText += ", being fetched";
-    row("bag", bagText);
-    row("feedback",
-        status["sharedSession"] == Value(true) ? "one session for all clients" : "one session for each client");
-    if (const Value& books = status["feedback"]; books.asDictionary()) {
-        const char* name = "events";
-        for (const std::string& line : bookLines(books)) row(std::exchange(name, ""), line);
-    }
-    row("clients", fmt::format("{}", status["sessions"].count()));
-    for (std::size_t i = 0; i < status["connections"].count(); ++i) {
-        const Value& connection = status["connections"][i];
-        const std::string client = text(connection["client"]);
-        row(i == 0 ? "connections" : "",
-            fmt::format("process {}, {}, last query {}", text(connection["pid"]),
-                        client.empty() ? "no known client" : client, text(connection["currentQueryId"])));
-    }
-    for (std::size_t i = 0; i < status["validImageHosts"].count(); ++i)
-        row(i == 0 ? "image hosts" : "", text(status["validImageHosts"][i]));
-    if (const Dictionary* open = status["transactions"].asDictionary(); open && !open->empty()) {
-        for (const auto& [name, count] : *open) row("pending", fmt::format("{} ({})", printable(name), text(count)));
+    for (const auto& [name, line] : statusRows(status)) row(name, line);
+}
+
+/// Shows the status again and again, until Ctrl-C. A terminal is cleared each time.
+void watchStatus(const Options& options, double interval)
+{
+    endOnSignal();
+    const auto client = connect(options);
+    const bool clears = isatty(STDOUT_FILENO) == 1 && !options.json;
+    for (;;) {
+        const Value status = valueOf(client->status());
+        if (clears) printText("\033[H\033[2J");
+        printStatus(options, status);
+        if (!clears && !options.json) printLine("");
+        client->wait([] { return false; }, platform::durationFromSeconds(interval));
     }
 }
 
@@ -148,10 +124,7 @@ Dictionary samplesIn(std::string_view openMetrics)
 void showStatistics(const Options& options, bool openMetrics)
 {
     const std::string statistics = valueOf(connect(options)->statistics());
-    if (openMetrics) {
-        std::fwrite(statistics.data(), 1, statistics.size(), stdout);
-        return;
-    }
+    if (openMetrics) return printText(statistics);
     const Dictionary samples = samplesIn(statistics);
     if (options.json) return printJson(samples);
     for (const auto& [name, value] : samples) printLine(fmt::format("{:>12}  {}", text(value), printable(name)));
@@ -163,12 +136,25 @@ void addInspectCommands(CLI::App& app, Command& chosen)
 {
     const auto add = [&](const char* name, const char* description, auto action) {
         CLI::App* command = app.add_subcommand(name, description);
-        command->callback([&chosen, action] { chosen = action; });
+        command->callback([&chosen, action] { chosen = paged(action); });
         return command;
     };
     add("bag", "The service's configuration, as this client sees it", showBag);
     add("sessions", "List the clients that connected", showSessions);
-    add("status", "Show the state of the daemon", showStatus);
+
+    CLI::App* status = app.add_subcommand("status", "Show the state of the daemon");
+    auto watch = std::make_shared<bool>(false);
+    auto interval = std::make_shared<double>(1);
+    CLI::Option* watching = status->add_flag("-w,--watch", *watch, "Show it again and again, until Ctrl-C");
+    CLI::Option* pause = status->add_option("--interval", *interval, "Time between two looks, in seconds");
+    tools::takesNumber(pause->capture_default_str()->needs(watching), "SECONDS", 0.1, 3600);
+    status->callback([&chosen, watch, interval] {
+        if (*watch)
+            chosen = [interval](const Options& options) { watchStatus(options, *interval); };
+        else
+            chosen = paged([](const Options& options) { printStatus(options, valueOf(connect(options)->status())); });
+    });
+
     auto openMetrics = std::make_shared<bool>(false);
     add("stats", "Show the daemon's counters", [openMetrics](const Options& options) {
         showStatistics(options, *openMetrics);

@@ -118,7 +118,7 @@ private:
 
     struct Key {
         std::int64_t queryId;
-        std::string line;
+        KeyLine line;
     };
 
     const MakeRequest& _makeRequest;

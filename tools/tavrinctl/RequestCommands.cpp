@@ -6,6 +6,7 @@
 #include "CoreTavrin/TAVRequest.h"
 #include "platform/values/Dictionary.h"
 #include "searchrecords/ZRViewFeedback.h"
+#include "tools/shared/CommandLine.h"
 #include "tools/tavrinctl/Commands.h"
 #include "tools/tavrinctl/RequestRunner.h"
 
@@ -28,7 +29,6 @@ struct RequestOptions {
 
 Exchange run(const Options& options, const RequestOptions& requestOptions, TAVRequest& request)
 {
-    request.verboseReply = requestOptions.verbose;
     request.queryItems = queryItems(requestOptions.items);
     RequestRunner runner(options, requestOptions.verbose);
     return requestOptions.endpoint ? runner.runThroughEndpoint(request, requestOptions.what)
@@ -75,7 +75,7 @@ CLI::App* add(CLI::App& app, const char* name, const char* description, const st
 {
     CLI::App* command = app.add_subcommand(name, description);
     command->add_flag("-v,--verbose", options->verbose, "Show the HTTP request and response");
-    command->add_option("--item", options->items, "NAME=VALUE to add to the URL's query; may be repeated");
+    addItemOption(*command, options->items);
     return command;
 }
 
@@ -94,6 +94,13 @@ void warm(const Options& options)
 }
 
 } // namespace
+
+void addItemOption(CLI::App& command, std::vector<std::string>& items)
+{
+    command.add_option("--item", items, "Item to add to the URL's query; may be repeated")
+        ->type_name("NAME=VALUE")
+        ->allow_extra_args(false);
+}
 
 void addOtherRequestCommands(CLI::App& app, Command& chosen)
 {
@@ -136,13 +143,13 @@ void addOtherRequestCommands(CLI::App& app, Command& chosen)
     auto lookup = std::make_shared<RequestOptions>();
     CLI::App* lookupCommand = add(app, "lookup", "Look up words of a text", lookup);
     lookupCommand->add_option("words", lookup->what, "Words to look up")->required();
-    lookupCommand->add_option("--context", lookup->context, "Text around the words");
-    lookupCommand->add_option("--client-context", lookup->clientContext, "Kind of the text: mail, article, …");
-    lookupCommand->add_option("--domain", lookup->domain, "Domain of the tapped hint");
-    lookupCommand
-        ->add_option("--selection", lookup->selection,
-                     "How the words were selected: 0 default, 1 explicit, 2 by a hint")
-        ->check(CLI::Range(0, 2));
+    lookupCommand->add_option("--context", lookup->context, "Text around the words")->type_name("TEXT");
+    lookupCommand->add_option("--client-context", lookup->clientContext, "Kind of the text: mail, article, …")
+        ->type_name("KIND");
+    lookupCommand->add_option("--domain", lookup->domain, "Domain of the tapped hint")->type_name("DOMAIN");
+    tools::takesName(lookupCommand->add_option("--selection", lookup->selection,
+                                               "How the words were selected: default, explicit, or hint"),
+                     "HOW", {{"default", 0}, {"explicit", 1}, {"hint", 2}});
     onChosen(lookupCommand, [lookup](const Options& common) {
         TAVLookupRequest request;
         request.queryString = lookup->what;

@@ -4,6 +4,7 @@
 
 #include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVRequest.h"
+#include "tools/tavrinctl/StatusText.h"
 
 namespace tavrin::ctl {
 
@@ -26,24 +27,26 @@ RequestRunner::RequestRunner(const Options& options, bool showHttp)
 
 std::shared_ptr<Exchange> RequestRunner::send(TAVRequest& request, std::string query, Shown answered)
 {
-    for (const auto& earlier : _outstanding) earlier->overtaken = true;
+    for (const Outstanding& earlier : _outstanding) earlier.exchange->overtaken = true;
     auto exchange = std::make_shared<Exchange>();
     exchange->query = std::move(query);
     exchange->showHttp = _showHttp;
     exchange->queryId = request.queryId = ++_lastQueryId;
+    request.verboseReply = true; // shows if the cache or the service answered, and with which status
     if (dynamic_cast<const TAVSearchRequest*>(&request)) exchange->skipReason = skipReason(_bag, exchange->query);
-    _outstanding.push_back(exchange);
+    const auto begin = Clock::now();
+    _outstanding.push_back({exchange, begin});
 
-    _session.client->send(request,
-                          [this, exchange, begin = Clock::now(), answered](platform::Result<TAVAnswer> answer) {
-                              exchange->latency = millisecondsSince(begin);
-                              if (answer)
-                                  exchange->answer = std::move(*answer);
-                              else
-                                  exchange->problem = answer.error().reason();
-                              std::erase(_outstanding, exchange);
-                              if (answered) answered(*exchange);
-                          });
+    _session.client->send(request, [this, exchange, begin, answered](platform::Result<TAVAnswer> answer) {
+        exchange->latency = millisecondsSince(begin);
+        if (answer)
+            exchange->answer = std::move(*answer);
+        else
+            exchange->problem = answer.error().reason();
+        std::erase_if(_outstanding, [&](const Outstanding& each) { return each.exchange == exchange; });
+        if (lacksBag(*exchange)) _withoutBag.push_back(exchange);
+        if (answered) answered(*exchange);
+    });
     return exchange;
 }
 
@@ -62,11 +65,23 @@ void RequestRunner::pause(std::chrono::duration<double, std::milli> duration)
 void RequestRunner::waitForAll()
 {
     if (_session.client->wait([this] { return _outstanding.empty(); }, platform::durationFromSeconds(_options.timeout)))
-        return;
+        return explainMissingBag();
     const std::string problem = _session.client->connected() ? fmt::format("no answer within {:g} s", _options.timeout)
                                                              : "the daemon closed the connection";
-    for (const auto& exchange : _outstanding) exchange->problem = problem;
+    for (const Outstanding& each : _outstanding) {
+        each.exchange->problem = problem;
+        each.exchange->latency = millisecondsSince(each.begin);
+    }
     _outstanding.clear();
+}
+
+/// Not called from an answer's callback, in which no other call can wait.
+void RequestRunner::explainMissingBag()
+{
+    if (_withoutBag.empty()) return;
+    if (const auto status = _session.client->status())
+        for (const auto& exchange : _withoutBag) exchange->cause = lastFetchText((*status)["bag"]);
+    _withoutBag.clear();
 }
 
 Exchange RequestRunner::run(TAVRequest& request, std::string query)
@@ -84,6 +99,7 @@ Exchange RequestRunner::runThroughEndpoint(TAVRequest& request, std::string quer
     exchange.query = std::move(query);
     exchange.showHttp = _showHttp;
     exchange.queryId = request.queryId = ++_lastQueryId;
+    request.verboseReply = true;
     const auto begin = Clock::now();
     auto answer = endpoint->request(request, _session.configuration);
     exchange.latency = millisecondsSince(begin);

@@ -30,7 +30,8 @@ public:
     [[nodiscard]] bool takeAnswers(const std::function<bool()>& done, int descriptor);
     /// Receives answers for `duration`.
     void pause(std::chrono::duration<double, std::milli> duration);
-    /// Receives answers until every request has one. A request without an answer in time gets a `problem`.
+    /// Receives answers until every request has one. A request without an answer in time gets a `problem`, one that
+    /// failed for want of a bag the `cause`.
     void waitForAll();
     /// Sends a request and blocks until its answer or the time-out.
     Exchange run(TAVRequest& request, std::string query);
@@ -38,11 +39,18 @@ public:
     Exchange runThroughEndpoint(TAVRequest& request, std::string query);
 
 private:
+    void explainMissingBag();
+
     const Options& _options;
     const bool _showHttp;
     Session _session;
     TAVBagAnswer _bag;
-    std::vector<std::shared_ptr<Exchange>> _outstanding;
+    struct Outstanding {
+        std::shared_ptr<Exchange> exchange;
+        std::chrono::steady_clock::time_point begin;
+    };
+    std::vector<Outstanding> _outstanding;
+    std::vector<std::shared_ptr<Exchange>> _withoutBag; // answered since the last wait
     std::int64_t _lastQueryId = 0;
 };
 

@@ -65,7 +65,9 @@ void addResourceCommand(CLI::App& app, Command& chosen)
     auto identifier = std::make_shared<std::string>();
     auto output = std::make_shared<std::string>();
     auto* name = command->add_option("name", *identifier, "Key of the resource in the bag");
-    command->add_option("-o,--output", *output, "File to write instead of standard output")->needs(name);
+    command->add_option("-o,--output", *output, "File to write instead of standard output")
+        ->type_name("FILE")
+        ->needs(name);
     command->footer("With --json prints the file's attributes; its contents are only written to the file of -o.");
     command->callback([&chosen, identifier, output] {
         chosen = [identifier, output](const Options& options) {

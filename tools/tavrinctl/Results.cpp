@@ -47,11 +47,14 @@ Value valueOfError(const platform::Error& error)
 }
 
 /// Returns the error's reason, and what to check next if that is known.
-std::string explain(const platform::Error& error)
+std::string explain(const Exchange& exchange)
 {
-    std::string reason = printable(error.reason().empty() ? error.description() : error.reason());
-    if (error.domain == TAVErrorDomain && error.code == TAVErrorTimeout)
-        return reason + " (no bag yet; check its URL with \"tavrinctl defaults read TAVBagURL\")";
+    const platform::Error& error = *exchange.answer->error;
+    if (lacksBag(exchange))
+        return fmt::format("the daemon has no bag{}; \"tavrinctl doctor\" says what to do",
+                           exchange.cause.empty() ? "" : " (" + printable(exchange.cause) + ")");
+    const std::string reason = printable(error.reason().empty() ? error.description() : error.reason());
+    if (error.domain == platform::kFormatErrorDomain) return "the service's answer is not JSON: " + reason;
     return reason;
 }
 
@@ -93,8 +96,21 @@ std::string_view outcomeName(Outcome outcome)
 Outcome Exchange::outcome() const
 {
     if (!answer || answer->error) return Outcome::Failed;
+    if (const int status = serviceStatus(*this); status != 0 && (status < 200 || status > 299)) return Outcome::Failed;
     if (answer->reply) return Outcome::Answered;
     return overtaken && skipReason.empty() ? Outcome::Overtaken : Outcome::Skipped;
+}
+
+int serviceStatus(const Exchange& exchange)
+{
+    const auto* reply = exchange.answer ? exchange.answer->reply.get() : nullptr;
+    return reply && reply->httpResponse ? static_cast<int>(reply->httpResponse->statusCode) : 0;
+}
+
+bool lacksBag(const Exchange& exchange)
+{
+    const auto* error = exchange.answer && exchange.answer->error ? &*exchange.answer->error : nullptr;
+    return error && error->domain == TAVErrorDomain && error->code == TAVErrorTimeout && error->reason() == "timeout";
 }
 
 std::string_view mark(const Exchange& exchange)
@@ -116,7 +132,10 @@ std::string explanation(const Exchange& exchange)
     case Outcome::Overtaken: return "overtaken by a later key and delivered empty";
     case Outcome::Failed: break;
     }
-    return exchange.answer ? explain(*exchange.answer->error) : exchange.problem;
+    if (!exchange.answer) return exchange.problem;
+    if (const int status = serviceStatus(exchange); status != 0 && (status < 200 || status > 299))
+        return fmt::format("the service answered {}", status);
+    return explain(exchange);
 }
 
 std::string skipReason(const TAVBagAnswer& answer, std::string_view query)
@@ -159,6 +178,23 @@ Value rawResponse(const Exchange& exchange)
     return platform::parseJson(exchange.answer->reply->rawResponse->view()).value_or(Value());
 }
 
+std::vector<std::string> cardLines(const Value& rawResponse)
+{
+    std::vector<std::string> lines;
+    for (const Value& set : arrayOf(rawResponse))
+        for (const Value& result : arrayOf(set["results"])) {
+            const Value& card = result["card"];
+            if (!card.asDictionary()) continue;
+            if (const std::string title = textIn(card["title"]); !title.empty()) lines.push_back(printable(title));
+            for (const Value& section : arrayOf(card["card_sections"])) {
+                const std::string title = printable(textIn(section["title"]));
+                const std::string text = printable(textIn(section["text"]));
+                if (!title.empty() || !text.empty()) lines.push_back("  " + padded(title, 14) + "  " + text);
+            }
+        }
+    return lines;
+}
+
 Value describe(const Exchange& exchange)
 {
     Dictionary description{{"query", exchange.query},
@@ -167,8 +203,14 @@ Value describe(const Exchange& exchange)
                            {"latency_ms", std::round(exchange.latency * 100) / 100}};
     if (exchange.outcome() == Outcome::Skipped && !exchange.skipReason.empty())
         description.set("reason", exchange.skipReason);
-    if (!exchange.answer) description.set("reason", exchange.problem);
+    if (exchange.outcome() == Outcome::Failed) description.set("reason", explanation(exchange));
+    if (const int status = serviceStatus(exchange); status != 0) description.set("http_status", status);
     if (exchange.answer && exchange.answer->error) description.set("error", valueOfError(*exchange.answer->error));
+    if (exchange.showHttp && exchange.answer && exchange.answer->reply) {
+        const TAVReply& reply = *exchange.answer->reply;
+        if (reply.httpRequest) description.set("http_request", platform::toValue(*reply.httpRequest));
+        if (reply.httpResponse) description.set("http_response", platform::toValue(*reply.httpResponse));
+    }
     if (exchange.outcome() != Outcome::Answered) return description;
 
     const Value raw = rawResponse(exchange);
@@ -183,10 +225,6 @@ Value describe(const Exchange& exchange)
     description.set("results", std::move(results));
     description.set("suggestions", std::move(suggestions));
     description.set("response", raw);
-    if (!exchange.showHttp) return description;
-    const TAVReply& reply = *exchange.answer->reply;
-    if (reply.httpRequest) description.set("http_request", platform::toValue(*reply.httpRequest));
-    if (reply.httpResponse) description.set("http_response", platform::toValue(*reply.httpResponse));
     return description;
 }
 
@@ -200,8 +238,8 @@ std::string summary(const Exchange& exchange)
 
 void printAnswer(const Exchange& exchange, std::size_t limit)
 {
+    if (exchange.showHttp && exchange.answer && exchange.answer->reply) printHttp(*exchange.answer->reply);
     if (exchange.outcome() != Outcome::Answered) return;
-    if (exchange.showHttp) printHttp(*exchange.answer->reply);
     const Value raw = rawResponse(exchange);
     std::string section;
     const std::vector<ListedResult> results = resultsIn(raw);
@@ -212,6 +250,7 @@ void printAnswer(const Exchange& exchange, std::size_t limit)
         if (!result.url.empty()) printLine(dim("      " + printable(result.url)));
     }
     if (results.size() > limit) printLine(dim(fmt::format("    … and {} more", results.size() - limit)));
+    for (const std::string& line : cardLines(raw)) printLine("    " + line);
     std::string suggestions;
     for (const std::string& suggestion : suggestionsIn(raw))
         suggestions += (suggestions.empty() ? "" : " · ") + printable(suggestion);

@@ -26,12 +26,18 @@ struct Exchange {
     std::string skipReason;          ///< why the daemon would skip this query, by its bag; empty if it wouldn't
     std::optional<TAVAnswer> answer; ///< nothing: no answer in time, or the connection ended
     std::string problem;             ///< what happened instead of an answer
+    std::string cause;               ///< more about why there is no bag, for a failure because of that
 
     bool showHttp = false; ///< the HTTP request and response are to be shown
 
     [[nodiscard]] Outcome outcome() const;
     [[nodiscard]] bool waiting() const { return !answer && problem.empty(); }
 };
+
+/// Returns the HTTP status of an answer that came from the service; 0 if it did not, or if the reply is not verbose.
+[[nodiscard]] int serviceStatus(const Exchange& exchange);
+/// Returns whether the request failed because the daemon had no bag in time.
+[[nodiscard]] bool lacksBag(const Exchange& exchange);
 
 /// Returns "network" or "cache" for the source of an answer, "answered" if the reply is not verbose and hides its
 /// source, and the outcome's name for any other outcome.
@@ -56,12 +62,14 @@ struct ListedResult {
 /// Returns the service's answer as a value; null if there is none.
 [[nodiscard]] platform::Value rawResponse(const Exchange& exchange);
 
+/// Returns the lines of the card that the answer has: its title, then each section's title and text.
+[[nodiscard]] std::vector<std::string> cardLines(const platform::Value& rawResponse);
 /// Returns {"query", "outcome", "latency_ms", "results", …} for scripts.
 [[nodiscard]] platform::Value describe(const Exchange& exchange);
 /// Returns one line with the query, the latency and the outcome.
 [[nodiscard]] std::string summary(const Exchange& exchange);
-/// Prints at most `limit` results by section (0 for all), the suggestions, and the HTTP request and response if the
-/// exchange has `showHttp`.
+/// Prints at most `limit` results by section (0 for all), the card, the suggestions, and the HTTP request and response
+/// if the exchange has `showHttp`.
 void printAnswer(const Exchange& exchange, std::size_t limit);
 
 } // namespace tavrin::ctl

@@ -6,6 +6,7 @@
 #include <fmt/format.h>
 
 #include "CoreTavrin/TAVRequest.h"
+#include "tools/shared/CommandLine.h"
 #include "tools/tavrinctl/Commands.h"
 #include "tools/tavrinctl/InteractiveSearch.h"
 #include "tools/tavrinctl/RequestRunner.h"
@@ -40,10 +41,11 @@ void search(const Options& options, const SearchOptions& searchOptions)
 {
     const auto request = [&](const std::string& query) {
         auto search = TAVSearchRequest::searchRequestWithString(query, StartSearchTrigger::NewCharacter);
-        search->verboseReply = true; // shows if the cache or the service answered
         search->queryItems = queryItems(searchOptions.items);
         return search;
     };
+    if (searchOptions.interactive && options.json)
+        throw Failure("--interactive shows a screen for people; use --typed with --json", tools::kWrongUsage);
     if (searchOptions.interactive) return searchInteractively(options, searchOptions.query, request);
 
     RequestRunner runner(options, searchOptions.verbose);
@@ -67,7 +69,8 @@ void search(const Options& options, const SearchOptions& searchOptions)
     } else if (!keys.empty()) {
         printAnswer(*keys.back(), options.limit);
     }
-    if (!keys.empty() && keys.back()->outcome() == Outcome::Failed) throw Failure("the last key's search failed");
+    if (!keys.empty() && keys.back()->outcome() == Outcome::Failed)
+        throw Failure("the last key's search failed: " + explanation(*keys.back()));
 }
 
 } // namespace
@@ -81,13 +84,14 @@ void addSearchCommand(CLI::App& app, Command& chosen)
         command->add_flag("-i,--interactive", options->interactive, "Search with every key typed into the terminal");
     command->add_flag("--typed", options->typed, "Send a request for each key without waiting for answers")
         ->excludes(interactive);
-    command->add_option("--interval", options->interval, "Milliseconds between keys")
-        ->check(CLI::Range(0.0, 60000.0))
-        ->capture_default_str();
+    tools::takesNumber(command->add_option("--interval", options->interval, "Time between keys, in milliseconds")
+                           ->capture_default_str(),
+                       "MILLISECONDS", 0, 60000);
     command->add_flag("-v,--verbose", options->verbose, "Show the HTTP request and response");
-    command->add_option("--item", options->items, "NAME=VALUE to add to the URL's query; may be repeated");
+    addItemOption(*command, options->items);
     command->callback([options, &chosen] {
-        if (options->query.empty() && !options->interactive) throw CLI::RequiredError("query, or --interactive,");
+        if (options->query.empty() && !options->interactive)
+            throw CLI::ValidationError("give a query, or use --interactive");
         chosen = [options](const Options& common) { search(common, *options); };
     });
 }

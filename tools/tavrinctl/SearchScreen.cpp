@@ -16,8 +16,11 @@ namespace {
 using Style = ScreenLine::Style;
 
 constexpr std::string_view kPrompt = "Search: ";
-constexpr std::string_view kHelp = "Ctrl-U clears, arrows move and scroll, Ctrl-C ends";
+constexpr std::string_view kHelp = "Ctrl-C ends, Ctrl-U clears, arrows move and scroll";
 constexpr int kMostKeys = 6;
+constexpr int kWidestQuery = 24;
+constexpr int kOutcomeColumns = 23; // with the blanks before it
+constexpr int kFewestDetails = 8;   // columns; fewer say nothing
 
 /// The number of rows of each part, from top to bottom.
 struct Rows {
@@ -66,6 +69,12 @@ Part aroundCursor(std::string_view text, std::size_t cursor, int columns)
     return {part, std::max(wanted - skipped, 0)};
 }
 
+std::string keyText(const KeyLine& key, int queryColumns, int columns)
+{
+    const std::string line = fmt::format("{}  {}", padded(key.query, queryColumns), key.outcome);
+    return columnsOf(line) + kFewestDetails > columns ? line : line + "  " + key.details;
+}
+
 } // namespace
 
 std::size_t answerRows(std::size_t keys, ScreenSize size)
@@ -104,7 +113,9 @@ ScreenFrame layOut(const SearchView& view, ScreenSize size)
     fillTo(std::max(size.rows, 1) - below);
     if (rows.keys > 0) {
         add("");
-        for (const std::string& key : std::span(view.keys).last(static_cast<std::size_t>(rows.keys))) add(key);
+        const int queryColumns = std::clamp(columns - kOutcomeColumns, 6, kWidestQuery);
+        for (const KeyLine& key : std::span(view.keys).last(static_cast<std::size_t>(rows.keys)))
+            add(keyText(key, queryColumns, columns));
     }
     if (rows.help) add(kHelp, Style::Dim);
     return frame;
@@ -146,11 +157,11 @@ std::vector<ScreenLine> answerLines(const Exchange& exchange)
     return lines;
 }
 
-std::string keyLine(const Exchange& exchange)
+KeyLine keyLine(const Exchange& exchange)
 {
-    const std::string query = padded("\"" + printable(exchange.query) + "\"", 24);
-    if (exchange.waiting()) return query + "  …";
-    return fmt::format("{}  {:<9} {:>8.1f} ms  {}", query, mark(exchange), exchange.latency, explanation(exchange));
+    const std::string query = "\"" + printable(exchange.query) + "\"";
+    if (exchange.waiting()) return {query, "…", ""};
+    return {query, fmt::format("{:<9} {:>8.1f} ms", mark(exchange), exchange.latency), explanation(exchange)};
 }
 
 } // namespace tavrin::ctl

@@ -15,6 +15,13 @@ struct ScreenLine {
     bool operator==(const ScreenLine&) const = default;
 };
 
+/// The line of a key. In a narrow window its query is cut first, its details next, and its outcome last.
+struct KeyLine {
+    std::string query;
+    std::string outcome; ///< its source or outcome, and the latency
+    std::string details;
+};
+
 struct ScreenSize {
     int columns = 80;
     int rows = 24;
@@ -27,7 +34,7 @@ struct SearchView {
     std::size_t cursor = 0; ///< bytes of the text before it
     std::vector<ScreenLine> answer;
     std::size_t scrolled = 0; ///< lines of the answer that are above the screen
-    std::vector<std::string> keys;
+    std::vector<KeyLine> keys;
 };
 
 /// The lines to draw: at most as many as the screen has rows, none wider than the screen.
@@ -48,6 +55,6 @@ struct ScreenFrame {
 /// Returns the lines of an answer: results by section and suggestions, or the reason for having none.
 [[nodiscard]] std::vector<ScreenLine> answerLines(const Exchange& exchange);
 /// Returns the line of a key: the query, its source or outcome, the latency and the number of results.
-[[nodiscard]] std::string keyLine(const Exchange& exchange);
+[[nodiscard]] KeyLine keyLine(const Exchange& exchange);
 
 } // namespace tavrin::ctl

@@ -88,7 +88,7 @@ void addSessionCommand(CLI::App& app, Command& chosen)
     command->add_option("file", *file, "$XDG_CACHE_HOME/com.quorvane.tavrind/session.N")->required();
     command->footer(
         "Times are relative to the first event. A damaged file is shown up to the damage, with exit status 1.");
-    command->callback([&chosen, file] { chosen = [file](const Options& options) { show(options, *file); }; });
+    command->callback([&chosen, file] { chosen = paged([file](const Options& options) { show(options, *file); }); });
 }
 
 } // namespace tavrin::ctl

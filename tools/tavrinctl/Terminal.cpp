@@ -33,6 +33,7 @@ Terminal::Terminal()
 {
     if (isatty(STDIN_FILENO) != 1 || isatty(STDOUT_FILENO) != 1 || tcgetattr(STDIN_FILENO, &_original) != 0)
         throw Failure("--interactive needs a terminal; use --typed in scripts", 2);
+    endProgress();
     sigemptyset(&_signals);
     sigaddset(&_signals, SIGWINCH);
     for (const int signal : kEnding) sigaddset(&_signals, signal);

@@ -1,13 +1,8 @@
 #include "tools/tavrinctl/Tool.h"
 
-#include <cstdio>
-#include <cstdlib>
-#include <unistd.h>
-
 #include <fmt/format.h>
 
 #include "platform/files/Files.h"
-#include "platform/values/Json.h"
 
 namespace tavrin::ctl {
 
@@ -41,34 +36,6 @@ std::string readFile(const std::string& path, std::size_t maximumSize)
         platform::makeSystemFiles()->read(found.empty() ? std::filesystem::absolute(path) : found, maximumSize);
     if (!bytes) throw Failure("can't read " + bytes.error().reason());
     return std::string(bytes->view());
-}
-
-void printJson(const platform::Value& value)
-{
-    printLine(platform::toJson(value, platform::JsonStyle::Pretty));
-}
-
-void printLine(const std::string& text)
-{
-    std::fwrite(text.data(), 1, text.size(), stdout);
-    std::fputc('\n', stdout);
-    std::fflush(stdout); // readers of a pipe see each answer at once
-}
-
-bool colours()
-{
-    static const bool wanted = isatty(STDOUT_FILENO) == 1 && !std::getenv("NO_COLOR");
-    return wanted;
-}
-
-std::string bold(const std::string& text)
-{
-    return colours() ? "\033[1m" + text + "\033[0m" : text;
-}
-
-std::string dim(const std::string& text)
-{
-    return colours() ? "\033[2m" + text + "\033[0m" : text;
 }
 
 std::string printable(std::string_view text)

@@ -8,6 +8,7 @@
 #include "CoreTavrin/TAVClient.h"
 #include "CoreTavrin/TAVSessionConfiguration.h"
 #include "platform/values/Value.h"
+#include "tools/tavrinctl/Output.h"
 
 namespace tavrin::ctl {
 
@@ -50,15 +51,6 @@ template <class T> [[nodiscard]] T valueOf(platform::Result<T> result)
 
 /// Reads a file of at most `maximumSize` bytes and follows links. Throws `Failure` if that fails.
 [[nodiscard]] std::string readFile(const std::string& path, std::size_t maximumSize);
-
-/// Prints a value as indented JSON.
-void printJson(const platform::Value& value);
-/// Prints a line to standard output and flushes it.
-void printLine(const std::string& text);
-/// Returns true if standard output is a terminal and NO_COLOR is not set.
-[[nodiscard]] bool colours();
-[[nodiscard]] std::string bold(const std::string& text);
-[[nodiscard]] std::string dim(const std::string& text);
 
 /// Replaces control characters by blanks, so that a text from the service cannot control the terminal.
 [[nodiscard]] std::string printable(std::string_view text);
