@@ -1,6 +1,7 @@
 #pragma once
 
 #include <memory>
+#include <string>
 
 #include "tavrind/FeedbackBooks.h"
 #include "tavrind/RequestFigures.h"
@@ -48,6 +49,7 @@ struct Assembly {
     TavrinDiagnosticDataReporter diagnosticData;
     FeedbackBooks feedbackBooks;
     RequestFigures requestFigures;
+    std::string caFile; ///< certification authorities that replace the system's; empty: the system's
 
     std::shared_ptr<platform::UrlSession> urlSession; ///< foreground: every request of a client
     std::shared_ptr<platform::UrlSession> bagSession; ///< without caching; unused, the bag comes on urlSession

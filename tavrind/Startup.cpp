@@ -28,23 +28,18 @@
 
 namespace tavrin {
 
-std::string caFile()
-{
-    const char* path = std::getenv("SSL_CERT_FILE");
-    return path ? path : "";
-}
-
 namespace {
 
 using namespace std::chrono_literals;
 
-platform::UrlSessionConfiguration foregroundConfiguration(const platform::Device& device)
+platform::UrlSessionConfiguration foregroundConfiguration(const Assembly& assembly)
 {
+    const platform::Device& device = assembly.device;
     return {.allowFastOpenAndTickets = !device.userDefaults.boolean("TAVNoParallax"),
             .pipelining = true,
             .meteredPurgeTimeout = 10s,
             .network = &device.network,
-            .caFile = caFile(),
+            .caFile = assembly.caFile,
             .cache = platform::HttpCacheConfiguration{
                 .memoryCapacity = 1u << 20,
                 .diskCapacity = 100u << 20,
@@ -70,10 +65,11 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device, Star
 
     auto daemon = std::make_unique<Daemon>(device);
     Assembly& assembly = daemon->assembly;
+    if (const char* authorities = std::getenv("SSL_CERT_FILE")) assembly.caFile = authorities; // as OpenSSL
     const auto sessionQueue = [&](const char* label) { return device.concurrentQueue(label, rank::kRoot); };
 
-    assembly.urlSession =
-        device.urlLoader.makeSession(foregroundConfiguration(device), sessionQueue("com.quorvane.tavrind.urlSession"));
+    assembly.urlSession = device.urlLoader.makeSession(foregroundConfiguration(assembly),
+                                                       sessionQueue("com.quorvane.tavrind.urlSession"));
     assembly.requestFactory = TAVNetworkRequestFactory::make(assembly);
     assembly.subscriptionManager = TavrinSubscriptionManager::make(assembly, assembly.requestFactory);
     assembly.downloadManager = DownloadManager::make(assembly);
@@ -84,18 +80,18 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device, Star
         {.identifier = "com.quorvane.tavrind",
          .allowsMetered = false,
          .resourceTimeout = 24h,
-         .caFile = caFile(),
+         .caFile = assembly.caFile,
          .rank = rank::kContext},
         assembly.downloadManager, device.serialQueue("com.quorvane.tavrind.downloadSession", rank::kRoot));
     assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.launch");
-    assembly.bagSession =
-        device.urlLoader.makeSession({.meteredPurgeTimeout = 10s, .network = &device.network, .caFile = caFile()},
-                                     sessionQueue("com.quorvane.tavrind.bagSession"));
+    assembly.bagSession = device.urlLoader.makeSession(
+        {.meteredPurgeTimeout = 10s, .network = &device.network, .caFile = assembly.caFile},
+        sessionQueue("com.quorvane.tavrind.bagSession"));
     assembly.uploadURLSession = device.backgroundSessions.make(
         {.identifier = "com.quorvane.tavrind.flusher.nsurlsession",
          .requestTimeout = 300s,
          .resourceTimeout = std::chrono::days(7),
-         .caFile = caFile(),
+         .caFile = assembly.caFile,
          .rank = rank::kContext},
         assembly.backgroundFlusher, device.serialQueue("com.quorvane.tavrind.uploadSession", rank::kRoot));
     assembly.backgroundFlusher->findUploads();

@@ -1,7 +1,6 @@
 #pragma once
 
 #include <memory>
-#include <string>
 
 #include "platform/values/Error.h"
 #include "tavrind/Assembly.h"
@@ -18,10 +17,6 @@ namespace tavrin {
 
 class TavrinDPAppDeepLinkIngester;
 class TavrinService;
-
-/// Returns the file of the certification authorities that replace the system's; empty if there is none. OpenSSL reads
-/// the same variable.
-[[nodiscard]] std::string caFile();
 
 /// A started daemon: the services, and the objects that only the entry point owns.
 struct Daemon {

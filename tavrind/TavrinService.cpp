@@ -28,7 +28,6 @@
 #include "tavrind/ClientStateManager.h"
 #include "tavrind/QueueRanks.h"
 #include "tavrind/RequestKind.h"
-#include "tavrind/Startup.h"
 #include "tavrind/TAVNetworkRequestFactory.h"
 #include "tavrind/TavrinBagController.h"
 #include "tavrind/TavrinFlusherXPC.h"
@@ -172,7 +171,7 @@ Value TavrinService::status()
                                 {"watchers", _assembly.flusherXPCListener->watchers()},
                                 {"flushingStopped", _assembly.backgroundFlusher->stopFlushing()},
                                 {"directories", std::move(directories)},
-                                {"caFile", caFile()},
+                                {"caFile", _assembly.caFile},
                                 {"wiped", _options.wiped}});
 }
 
