@@ -135,9 +135,16 @@ void BackgroundActivitiesManager::previewUploads(platform::Reply<Value::Array> r
         std::size_t left = kMaximumPreview;
         const auto add = [&](Value upload, bool open) {
             const platform::Bytes* body = upload["body"].asBytes();
-            if (!body || body->size() > left) return;
-            left -= body->size();
-            if (open) upload.mutableDictionary().set("open", true);
+            if (!body) return;
+            const std::size_t size = body->size();
+            platform::Dictionary& description = upload.mutableDictionary();
+            if (open) description.set("open", true);
+            if (size > left) {
+                description.remove("body");
+                description.set("bytes", size);
+            } else {
+                left -= size;
+            }
             uploads.push_back(std::move(upload));
         };
         TavrinPersistentStorage& storage = *self->_assembly.persistentStorage;

@@ -2,7 +2,6 @@
 
 #include <algorithm>
 #include <functional>
-#include <map>
 #include <unistd.h>
 
 #include "CoreTavrin/TAVBag.h"
@@ -25,6 +24,7 @@
 #include "tavrind/BackgroundActivitiesManager.h"
 #include "tavrind/ClientConnection.h"
 #include "tavrind/ClientSessionManager.h"
+#include "tavrind/ClientState.h"
 #include "tavrind/ClientStateManager.h"
 #include "tavrind/QueueRanks.h"
 #include "tavrind/RequestKind.h"
@@ -38,6 +38,28 @@ namespace tavrin {
 
 using platform::Value;
 namespace ipc = platform::ipc;
+
+namespace {
+
+/// Describes a request, with the origin of each part; a part without one is the user's.
+Value previewOf(const platform::UrlRequest& request, const RequestOrigins& origins)
+{
+    const auto part = [](const std::string& name, const std::string& value, const auto& known) {
+        const auto found = known.find(name);
+        return Value::dictionaryOf(
+            {{"name", name}, {"value", value}, {"from", found == known.end() ? "user" : found->second}});
+    };
+    Value::Array items, headers;
+    for (const platform::QueryItem& item : platform::UrlComponents(request.url).queryItems())
+        items.push_back(part(item.name, item.value.value_or(""), origins.items));
+    for (const auto& [name, value] : request.headers) headers.push_back(part(name, value, origins.headers));
+    return Value::dictionaryOf({{"method", request.method},
+                                {"url", request.url.string()},
+                                {"items", std::move(items)},
+                                {"headers", std::move(headers)}});
+}
+
+} // namespace
 
 std::shared_ptr<TavrinService> TavrinService::make(Assembly& assembly, StartOptions options)
 {
@@ -204,8 +226,12 @@ void TavrinService::waiting(platform::Reply<Value> reply)
     _assembly.downloadURLSession->describe(take("downloads"));
     _assembly.device.activities.describe(take("activities"));
     all.notify([lists, reply = std::move(reply)]() mutable {
-        platform::MutexLock lock(lists->mutex);
-        reply(std::move(lists->lists));
+        platform::Dictionary waiting;
+        {
+            const platform::MutexLock lock(lists->mutex);
+            waiting = std::move(lists->lists);
+        }
+        reply(std::move(waiting));
     });
 }
 
@@ -224,33 +250,20 @@ void TavrinService::previewRequest(std::shared_ptr<TAVRequest> request, platform
 
     const auto& configuration = request->configuration;
     const std::string userAgent = configuration ? configuration->userAgent.value_or("") : "";
+    const auto client =
+        configuration ? _assembly.clientStateManager->stateForClientIdentifier(configuration->identifier) : nullptr;
+    const auto guids = client ? client->guidController() : _assembly.guidController;
     const TAVBag bag(current->rawBag(), userAgent);
     RequestOrigins origins;
     const ClientRequest parts{.request = *request,
                               .bag = &bag,
-                              .userGuid = _assembly.guidController->lastKnownUserGUID(),
+                              .userGuid = guids->lastKnownUserGUID(),
                               .userAgent = userAgent,
                               .fieldMask = fieldMaskFor(userAgent),
                               .origins = &origins};
     const auto built = std::invoke(kind->builder, *_assembly.requestFactory, parts);
     if (!built) return reply({}, makeTAVError(TAVErrorInvalidResponse, "no URL"));
-
-    const auto from = [](const std::map<std::string, std::string_view>& known, const std::string& name) {
-        const auto found = known.find(name);
-        return found == known.end() ? std::string_view("user") : found->second;
-    };
-    Value::Array items, headers;
-    for (const platform::QueryItem& item : platform::UrlComponents(built->url).queryItems())
-        items.push_back(Value::dictionaryOf(
-            {{"name", item.name}, {"value", item.value.value_or("")}, {"from", from(origins.items, item.name)}}));
-    for (const auto& [name, value] : built->headers)
-        headers.push_back(
-            Value::dictionaryOf({{"name", name}, {"value", value}, {"from", from(origins.headers, name)}}));
-    reply(Value::dictionaryOf({{"method", built->method},
-                               {"url", built->url.string()},
-                               {"items", std::move(items)},
-                               {"headers", std::move(headers)}}),
-          {});
+    reply(previewOf(*built, origins), {});
 }
 
 void TavrinService::wipe(bool settings, platform::Reply<> reply)

@@ -63,8 +63,10 @@ void previewUploads(const Options& options, const std::string& directory)
     for (std::size_t i = 0; i < uploads.size(); ++i) {
         const Value& upload = uploads[i];
         const platform::Bytes bytes = upload["body"].asBytes() ? *upload["body"].asBytes() : platform::Bytes();
-        const FlushedBody body = flushedBody(bytes);
-        const std::string path = directory.empty() ? "" : saveBody(directory, i + 1, bytes);
+        const auto leftOut = upload["bytes"].asUInt();
+        const FlushedBody body =
+            leftOut ? FlushedBody{.packedSize = *leftOut, .problem = "too much for one preview"} : flushedBody(bytes);
+        const std::string path = directory.empty() || leftOut ? "" : saveBody(directory, i + 1, bytes);
         if (!options.json) {
             printUpload(i + 1, upload, body);
             if (!path.empty()) printLine(dim("   saved as " + path));
