@@ -12,6 +12,7 @@
 #include "CoreTavrin/TAVSessionConfiguration.h"
 #include "platform/files/Files.h"
 #include "platform/ipc/BusClient.h"
+#include "platform/ipc/ListenSocket.h"
 #include "platform/values/Dictionary.h"
 #include "searchrecords/ZRFeedback.h"
 
@@ -149,9 +150,14 @@ Result<void> TAVFlusherClient::initiateConnection(FlusherIntent intent)
     return {};
 }
 
+std::filesystem::path TAVClient::defaultSocket()
+{
+    return platform::Directories::fromEnvironment().runtime / "com.quorvane.tavrind/socket";
+}
+
 std::string TAVClient::defaultAddress()
 {
-    return "unix:path=" + (platform::Directories::fromEnvironment().runtime / "com.quorvane.tavrind/socket").string();
+    return ipc::busAddress(defaultSocket());
 }
 
 Result<std::unique_ptr<TAVClient>> TAVClient::connect(const std::string& address)

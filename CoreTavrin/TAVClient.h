@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstdint>
+#include <filesystem>
 #include <functional>
 #include <map>
 #include <memory>
@@ -126,7 +127,9 @@ private:
 /// that a later one has overtaken has no reply.
 class TAVClient : public TAVConnection {
 public:
-    /// Returns "unix:path=$XDG_RUNTIME_DIR/com.quorvane.tavrind/socket".
+    /// Returns $XDG_RUNTIME_DIR/com.quorvane.tavrind/socket.
+    [[nodiscard]] static std::filesystem::path defaultSocket();
+    /// Returns the D-Bus address of that socket.
     [[nodiscard]] static std::string defaultAddress();
     /// Connects. If the socket belongs to a systemd unit, connecting starts the daemon.
     [[nodiscard]] static platform::Result<std::unique_ptr<TAVClient>>

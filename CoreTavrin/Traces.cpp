@@ -1,6 +1,6 @@
 #include "CoreTavrin/Traces.h"
 
-#include <array>
+#include <cerrno>
 #include <filesystem>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -8,8 +8,11 @@
 #include <fmt/format.h>
 
 #include "CoreTavrin/TAVSettings.h"
+#include "platform/base/Uuid.h"
 #include "platform/files/Files.h"
 #include "platform/files/UserDefaults.h"
+#include "platform/values/Dictionary.h"
+#include "platform/values/Json.h"
 
 namespace tavrin {
 
@@ -19,46 +22,67 @@ namespace {
 
 constexpr const char* kService = "com.quorvane.tavrind";
 constexpr const char* kSharedSuite = "com.quorvane.lookup.shared";
-/// The temporary files that a killed daemon leaves.
-constexpr std::array<std::string_view, 2> kTemporary{"flusher_", "background-transfers-"};
+constexpr std::string_view kTransfersPrefix = "background-transfers-"; // and a UUID: a store that ends with its process
+constexpr std::size_t kLargestSettings = 4u << 20;                     // bytes
 
 class Removal {
 public:
     void remove(const fs::path& path)
     {
         std::error_code error;
+        const bool isLink = fs::is_symlink(path, error);
         fs::remove_all(path, error);
-        if (error) problems.push_back(fmt::format("{}: {}", path.string(), error.message()));
+        if (error)
+            add(path, error.message());
+        else if (isLink)
+            add(path, "was a symbolic link; what it points to stays");
     }
+    /// Removes the temporary files that a killed daemon left. Other programs use this directory, too.
     void removeTemporary(const fs::path& directory)
     {
         std::error_code error;
         for (fs::directory_iterator file(directory, error), end; !error && file != end; file.increment(error)) {
             const std::string name = file->path().filename().string();
             struct stat status{};
-            const bool isOurs = lstat(file->path().c_str(), &status) == 0 && status.st_uid == geteuid();
-            for (const std::string_view prefix : kTemporary)
-                if (isOurs && name.starts_with(prefix)) remove(file->path());
+            if (lstat(file->path().c_str(), &status) != 0 || status.st_uid != geteuid()) continue;
+            const bool isTransfers =
+                name.starts_with(kTransfersPrefix) && platform::Uuid::parse(name.substr(kTransfersPrefix.size()));
+            if (S_ISREG(status.st_mode) ? isUploadBody(name) : S_ISDIR(status.st_mode) && isTransfers)
+                remove(file->path());
         }
     }
     /// Removes what the daemon wrote from a settings file, and the copy of a damaged one.
     void removeDaemonSettings(const fs::path& path)
     {
         remove(path.string() + ".corrupt");
-        std::error_code ignored;
-        if (!fs::exists(path, ignored)) return;
         const auto files = platform::makeSystemFiles();
+        const auto bytes = files->read(path, kLargestSettings);
+        if (!bytes && bytes.error().code == ENOENT) return;
+        const auto parsed = bytes ? platform::parseJson(bytes->view()) : std::unexpected(bytes.error());
+        if (!parsed || !parsed->asDictionary()) return add(path, parsed ? "not an object" : parsed.error().reason());
         platform::UserDefaults settings(*files, path, nullptr);
-        for (const auto& [key, value] : settings.contents())
+        for (const auto& [key, value] : *parsed->asDictionary())
             if (const KnownSetting* known = knownSetting(key); known && known->isDaemons) settings.remove(key);
-        if (const auto written = settings.synchronize(); !written)
-            problems.push_back(fmt::format("{}: {}", path.string(), written.error().reason()));
+        if (const auto written = settings.synchronize(); !written) add(path, written.error().reason());
     }
 
     std::vector<std::string> problems;
+
+private:
+    void add(const fs::path& path, const std::string& problem)
+    {
+        problems.push_back(fmt::format("{}: {}", path.string(), problem));
+    }
 };
 
 } // namespace
+
+bool isUploadBody(std::string_view name)
+{
+    if (!name.starts_with(kUploadBodyPrefix) || name.size() != kUploadBodyPrefix.size() + kUploadBodyDigits)
+        return false;
+    return name.find_first_not_of("0123456789abcdefABCDEF", kUploadBodyPrefix.size()) == std::string_view::npos;
+}
 
 std::vector<std::string> removeTraces(const platform::Directories& directories, bool settings)
 {

@@ -1,5 +1,6 @@
 #include "tavrind/BackgroundActivitiesManager.h"
 
+#include "CoreTavrin/Traces.h"
 #include "platform/device/Device.h"
 #include "platform/files/Counters.h"
 #include "platform/files/Files.h"
@@ -165,7 +166,7 @@ void BackgroundActivitiesManager::_sweepBodies()
     const std::filesystem::path& directory = _assembly.device.directories.temporary;
     const platform::Date oldest = _assembly.device.clock.wallNow() - kOldBody;
     for (const std::string& name : _assembly.fileManager.list(directory).value_or(std::vector<std::string>())) {
-        if (!name.starts_with(kUploadBodyPrefix)) continue;
+        if (!isUploadBody(name)) continue;
         const auto info = _assembly.fileManager.info(directory / name);
         if (!info || info->kind != platform::FileInfo::Kind::File || info->modified > oldest) continue;
         if (_assembly.fileManager.remove(directory / name))

@@ -33,8 +33,10 @@ DaemonOptions parseDaemonOptions(int argc, char** argv)
     app.add_option("--etc", options.etc, "Where locale, time zone and keyboard are read (for development)")
         ->check(CLI::ExistingDirectory)
         ->capture_default_str();
-    app.add_option("--wipe", options.wipe,
-                   "Before the start, remove everything that is kept about the users: traces, or settings, too")
+    app.add_option(
+           "--wipe", options.wipe,
+           "Before the start, remove everything that is kept about the users: traces, or settings, too. No other "
+           "daemon may run")
         ->check(CLI::IsMember({"traces", "settings"}));
     try {
         app.parse(argc, argv);

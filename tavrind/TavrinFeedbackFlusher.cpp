@@ -3,6 +3,7 @@
 #include <cerrno>
 
 #include "CoreTavrin/TAVBag.h"
+#include "CoreTavrin/Traces.h"
 #include "platform/base/Log.h"
 #include "platform/base/Uuid.h"
 #include "platform/device/Device.h"
@@ -57,7 +58,8 @@ platform::Result<std::unique_ptr<platform::AppendFile>>
 makeTemporaryFile(platform::FileSystem& files, const std::filesystem::path& directory, std::filesystem::path& path)
 {
     for (int attempt = 0;; ++attempt) {
-        path = directory / (std::string(kUploadBodyPrefix) + platform::Uuid::random().string().substr(0, 6));
+        path = directory /
+               (std::string(kUploadBodyPrefix) + platform::Uuid::random().string().substr(0, kUploadBodyDigits));
         if (path.native().size() >= kMaximumPath) return std::unexpected(platform::Error::posix(ENAMETOOLONG));
         auto file = files.createForAppending(path);
         if (file || file.error().code != EEXIST || attempt == kMaximumBodyFileAttempts) return file;

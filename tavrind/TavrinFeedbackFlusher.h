@@ -38,9 +38,6 @@ template <> inline constexpr auto kTexts<FlusherIdentity> = texts("crowdsourcing
 /// Returns the text of an identity; empty for any other number.
 [[nodiscard]] std::string_view convertIdentifierToString(FlusherIdentity identifier);
 
-/// Prefix of the names of temporary files for upload bodies.
-inline constexpr std::string_view kUploadBodyPrefix = "flusher_";
-
 /// The data that the upload session stores with a task.
 struct UploadNote {
     FlusherIdentity flusher{};

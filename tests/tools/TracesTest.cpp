@@ -34,7 +34,7 @@ struct TracesTest : testing::Test {
         for (const char* file : {"knowledge/app-activities.db", "data-detectors/2.source"})
             write(directories.data / service / file);
         write(directories.temporary / "flusher_ABCDEF");
-        write(directories.temporary / "background-transfers-1" / "1.body");
+        write(directories.temporary / "background-transfers-6F9619FF-8B86-D011-B42D-00C04FC964FF" / "1.body");
         write(directories.config / "com.quorvane.tavrind.json.corrupt");
         std::string settings = "{\"TAVBagURL\": \"https://kept.example\"";
         for (const KnownSetting& setting : knownSettings())
@@ -71,30 +71,35 @@ struct TracesTest : testing::Test {
 TEST_F(TracesTest, NothingOfAUserIsLeft)
 {
     ASSERT_GE(marked().size(), 16u);
-    const fs::path kept = directories.config / service / "device.json", others = directories.temporary / "flusher";
-    write(kept, "{}");
-    write(others, "{}");
+    const fs::path& shared = directories.temporary;
+    const std::vector<fs::path> kept{directories.config / service / "device.json", shared / "flusher",
+                                     shared / "flusher_notes", shared / "flusher_ABCDE1" / "file",
+                                     shared / "background-transfers-of-mine" / "file"};
+    for (const fs::path& path : kept) write(path, "{}");
+    const auto isKept = [](const fs::path& path) { return fs::exists(path); };
     EXPECT_THAT(removeTraces(directories, false), testing::IsEmpty());
     EXPECT_THAT(marked(), testing::IsEmpty());
-    EXPECT_TRUE(fs::exists(kept) && fs::exists(others)) << "they are others'";
+    EXPECT_THAT(kept, testing::Each(testing::ResultOf(isKept, true))) << "they are others'";
     std::ifstream settings(directories.config / "com.quorvane.tavrind.json");
     EXPECT_THAT(std::string(std::istreambuf_iterator<char>(settings), {}), testing::HasSubstr("https://kept.example"));
 
     EXPECT_THAT(removeTraces(directories, true), testing::IsEmpty());
     EXPECT_FALSE(fs::exists(directories.config / "com.quorvane.tavrind.json"));
     EXPECT_FALSE(fs::exists(directories.config / "com.quorvane.lookup.shared.json"));
-    EXPECT_TRUE(fs::exists(kept));
+    EXPECT_THAT(kept, testing::Each(testing::ResultOf(isKept, true)));
     EXPECT_THAT(removeTraces(directories, true), testing::IsEmpty()) << "with nothing there";
 }
 
-TEST_F(TracesTest, LinksAreRemovedAndNotFollowed)
+TEST_F(TracesTest, WhatStaysIsReportedAndNoLinkIsFollowed)
 {
     const fs::path elsewhere = temporary / "elsewhere";
     write(elsewhere / "file", "theirs");
     fs::create_directory_symlink(elsewhere, directories.caches / service / "link");
     fs::remove_all(directories.state / service);
     fs::create_directory_symlink(elsewhere, directories.state / service);
-    EXPECT_THAT(removeTraces(directories, false), testing::IsEmpty());
+    write(directories.config / "com.quorvane.lookup.shared.json", "{");
+    EXPECT_THAT(removeTraces(directories, false),
+                testing::ElementsAre(testing::HasSubstr("was a symbolic link"), testing::HasSubstr("lookup.shared")));
     EXPECT_TRUE(fs::exists(elsewhere / "file"));
     EXPECT_FALSE(fs::exists(fs::symlink_status(directories.state / service)));
 }

@@ -11,6 +11,7 @@
 
 #include "CoreTavrin/Traces.h"
 #include "platform/files/Files.h"
+#include "platform/ipc/ListenSocket.h"
 #include "platform/values/Dictionary.h"
 #include "tools/shared/CommandLine.h"
 #include "tools/tavrinctl/Commands.h"
@@ -56,6 +57,21 @@ void awaitRestart(const Options& options)
     throw Failure("the daemon has not come back; start it, and look at its log");
 }
 
+/// Removes the traces in the directories of this environment. Holds the daemon's socket meanwhile, so that no daemon
+/// uses them. Throws `Failure`.
+void removeWithoutDaemon(bool settings)
+{
+    const platform::Directories directories = platform::Directories::fromEnvironment();
+    const auto socket = platform::ipc::ListenSocket::bindExclusive(TAVClient::defaultSocket());
+    if (!socket)
+        throw Failure(fmt::format("a daemon may be running, but doesn't answer ({}).\n"
+                                  "Stop it: systemctl --user stop tavrind.socket tavrind.service",
+                                  socket.error().reason()));
+    std::string lines;
+    for (const std::string& problem : removeTraces(directories, settings)) lines += "\n  " + problem;
+    if (!lines.empty()) throw Failure("not everything could be removed:" + lines);
+}
+
 void wipe(const Options& options, const WipeOptions& mine)
 {
     if (!mine.yes) ask(mine.settings);
@@ -67,10 +83,7 @@ void wipe(const Options& options, const WipeOptions& mine)
     } else {
         if (options.address != TAVClient::defaultAddress())
             throw Failure(fmt::format("no daemon answers at {} ({})", options.address, client.error().reason()));
-        const auto problems = removeTraces(platform::Directories::fromEnvironment(), mine.settings);
-        std::string lines;
-        for (const std::string& problem : problems) lines += "\n  " + problem;
-        if (!problems.empty()) throw Failure("not everything could be removed:" + lines);
+        removeWithoutDaemon(mine.settings);
     }
     if (options.json) return printJson(Value::dictionaryOf({{"wiped", true}, {"daemon", client.has_value()}}));
     printLine(client ? "Removed. The daemon has started again with nothing." : "Removed; no daemon was running.");
