@@ -9,13 +9,22 @@
 
 namespace tavrin {
 
-const platform::RecordClasses& coreRecordClasses()
+const platform::RecordClasses& feedbackRecordClasses()
 {
     static const auto classes = [] {
         platform::RecordClasses all = searchRecordClasses();
         all.addAll(platform::RecordClasses::of<TAVSkipSearchFeedback, TAVLookupStartNetworkSearchFeedback,
                                                TAVEndNetworkSearchFeedback, TAVRankerFeedback, TAVCacheHitFeedback,
                                                TAVSearchSuggestion, TAVCustomSearchResult, TAVPunchout>());
+        return all;
+    }();
+    return classes;
+}
+
+const platform::RecordClasses& coreRecordClasses()
+{
+    static const auto classes = [] {
+        platform::RecordClasses all = feedbackRecordClasses();
         all.addAll(
             platform::RecordClasses::of<TAVSessionConfiguration, TAVRequest, TAVSearchRequest, TAVZeroKeywordRequest,
                                         TAVMoreResultsRequest, TAVCardRequest, TAVLookupRequest, TAVFlightLookupRequest,

@@ -283,22 +283,40 @@ TEST(Introspection, DescribesEveryMemberAsItIsServed)
         EXPECT_EQ(membersIn(std::string(interface->introspection)), membersOf(*interface));
 }
 
-TEST(Records, EveryEventAndItsFieldsAreDocumented)
+/// Returns a type of the document in words, as a pattern: "av of `ZRText`" is "array of .*ZRText.*".
+std::string typeInWords(const std::string& documented)
+{
+    static const std::map<std::string, std::string> kWords{
+        {"b", "boolean"}, {"x", "integer"},   {"t", "integer"},   {"d", "number"},
+        {"s", "text"},    {"v", "any value"}, {"error", "error"}, {"a record", "any record"}};
+    if (documented.starts_with("av of ")) return "array of " + typeInWords(documented.substr(6));
+    if (documented.starts_with("`")) return ".*" + documented.substr(1, documented.size() - 2) + ".*";
+    const auto word = kWords.find(documented);
+    return word == kWords.end() ? "no type" : word->second;
+}
+
+TEST(Records, EveryFieldIsDocumentedWithItsType)
 {
     std::ifstream file(SOURCE_DIR "/docs/ipc/records.md");
     std::map<std::string, std::string> rows;
     const std::regex row("\\| `(\\w+)` \\|.*");
     for (std::string line; std::getline(file, line);)
         if (std::smatch found; std::regex_match(line, found, row)) rows[found[1]] = line;
-    for (const auto& [name, fields] : ctl::reportableRecords()) {
-        std::string documented = rows[name];
-        for (std::smatch base; std::regex_search(documented, base, std::regex("those of `(\\w+)`"));)
-            documented = base.prefix().str() + base.suffix().str() + rows[base[1]];
-        for (const Value& field : *fields.asArray())
-            EXPECT_TRUE(*field.asString() == "timestamp" || documented.contains("`" + *field.asString() + "`"))
-                << name << "." << *field.asString();
-        EXPECT_FALSE(documented.empty()) << name;
-    }
+    const auto [events, parts] = ctl::reportableRecords();
+    for (const auto* records : {&events, &parts})
+        for (const auto& [name, fields] : *records) {
+            std::string documented = rows[name];
+            for (std::smatch base; std::regex_search(documented, base, std::regex("those of `(\\w+)`"));)
+                documented = base.prefix().str() + base.suffix().str() + rows[base[1]];
+            EXPECT_FALSE(documented.empty()) << name;
+            for (const auto& [field, type] : *fields.asDictionary()) {
+                std::smatch found;
+                std::regex_search(documented, found, std::regex("`" + field + "` \\(([^:)]+)"));
+                EXPECT_TRUE(field == "timestamp" ||
+                            std::regex_match(*type.asString(), std::regex(typeInWords(found.str(1)))))
+                    << name << "." << field << ": " << *type.asString() << ", documented as " << found.str(1);
+            }
+        }
 }
 
 TEST(Client, WithoutADaemonSaysWhereItLooked)

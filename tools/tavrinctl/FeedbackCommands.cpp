@@ -6,11 +6,11 @@
 
 #include <CLI/CLI.hpp>
 #include <fmt/format.h>
-#include <fmt/ranges.h>
 
 #include "CoreTavrin/TAVBag.h"
 #include "platform/values/Dictionary.h"
 #include "platform/values/Json.h"
+#include "tools/tavrinctl/Characters.h"
 #include "tools/tavrinctl/Commands.h"
 #include "tools/tavrinctl/Events.h"
 #include "tools/tavrinctl/FeedbackRecords.h"
@@ -121,13 +121,18 @@ void listEvents(const Options& options)
 
 void listRecords(const Options& options)
 {
-    const platform::Dictionary records = reportableRecords();
-    if (options.json) return printJson(records);
-    for (const auto& [name, fields] : records) {
-        std::vector<std::string> names;
-        for (const Value& field : *fields.asArray()) names.push_back(*field.asString());
-        printLine(bold(name) + "\n    " + fmt::format("{}", fmt::join(names, ", ")));
-    }
+    const auto [events, parts] = reportableRecords();
+    if (options.json) return printJson(Value::dictionaryOf({{"events", events}, {"parts", parts}}));
+    const auto list = [](const char* title, const platform::Dictionary& records) {
+        printLine(title);
+        for (const auto& [name, fields] : records) {
+            printLine("  " + bold(name));
+            for (const auto& [field, type] : *fields.asDictionary())
+                printLine(fmt::format("    {} {}", padded(field, 27), *type.asString()));
+        }
+    };
+    list("Events", events);
+    list("Parts of events", parts);
 }
 
 } // namespace
@@ -146,7 +151,9 @@ void addFeedbackCommands(CLI::App& app, Command& chosen)
     sendCommand->add_option("file", *file, "JSON file, or - for standard input; see below")->required();
     sendCommand->footer(kExamples);
     sendCommand->callback([&chosen, file] { chosen = [file](const Options& options) { send(options, *file); }; });
-    feedback->add_subcommand("records", "List the classes of records that can be reported, with their fields")
+    feedback
+        ->add_subcommand("records",
+                         "List the events that can be reported and their parts, with the types of their fields")
         ->callback([&chosen] { chosen = paged(listRecords); });
 }
 

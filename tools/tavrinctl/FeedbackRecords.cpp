@@ -2,8 +2,10 @@
 
 #include <algorithm>
 #include <map>
+#include <set>
 
 #include <fmt/format.h>
+#include <fmt/ranges.h>
 
 #include "CoreTavrin/TAVRecordClasses.h"
 #include "platform/values/Dictionary.h"
@@ -85,26 +87,32 @@ private:
     std::vector<Open> _open;
 };
 
-/// Collects the names of a record's fields.
-class FieldNames final : public platform::Encoder {
-public:
-    Value::Array names;
-
-    void beginRecord(std::string_view, std::size_t) override {}
-    void key(std::string_view name) override { names.emplace_back(name); }
-    void endRecord() override {}
-    void beginArray(std::size_t) override {}
-    void endArray() override {}
-    void null() override {}
-    void boolean(bool) override {}
-    void integer(std::int64_t) override {}
-    void unsignedInteger(std::uint64_t) override {}
-    void real(double) override {}
-    void string(std::string_view) override {}
-    void bytes(const platform::Bytes&) override {}
-    void date(platform::Date) override {}
-    void value(const Value&) override {}
-};
+/// Returns a field's type in words: "text", "array of ZRSearchResult". For a record, names every class that fits.
+std::string typeText(const platform::FieldShape& shape)
+{
+    using Kind = platform::FieldShape::Kind;
+    switch (shape.kind) {
+    case Kind::Bool: return "boolean";
+    case Kind::Integer:
+    case Kind::Unsigned: return "integer";
+    case Kind::Real: return "number";
+    case Kind::Text: return "text";
+    case Kind::Bytes: return "bytes";
+    case Kind::Date: return "date";
+    case Kind::Value: return "any value";
+    case Kind::Error: return "error";
+    case Kind::Array: return "array of " + typeText(*shape.element);
+    case Kind::Record: break;
+    }
+    std::set<std::string_view> fitting;
+    bool all = true;
+    for (const auto& [name, record] : feedbackRecordClasses()) {
+        const bool fits = shape.isA(record.prototype.get());
+        if (fits) fitting.insert(name);
+        all = all && fits;
+    }
+    return all ? "any record" : fmt::format("{}", fmt::join(fitting, " or "));
+}
 
 /// Parses one record. The error lists its problems.
 std::expected<ReportedEvent, std::vector<std::string>> eventIn(const Value& json)
@@ -150,19 +158,18 @@ std::expected<std::vector<ReportedEvent>, std::vector<std::string>> eventsIn(con
     return events;
 }
 
-Dictionary reportableRecords()
+ReportableRecords reportableRecords()
 {
-    std::map<std::string_view, Value> records;
-    for (const auto& [name, make] : coreRecordClasses()) {
-        const auto record = make();
-        if (!dynamic_cast<const ZRFeedback*>(record.get())) continue;
-        FieldNames fields;
-        platform::encodeRecord(fields, *record);
-        records.emplace(name, std::move(fields.names));
+    std::map<std::string_view, const platform::RecordClass*> classes;
+    for (const auto& [name, record] : feedbackRecordClasses()) classes.emplace(name, &record);
+    ReportableRecords records;
+    for (const auto& [name, record] : classes) {
+        Dictionary fields;
+        for (const auto& field : record->fields) fields.set(std::string(field.name), typeText(*field.shape));
+        const bool isEvent = dynamic_cast<const ZRFeedback*>(record->prototype.get());
+        (isEvent ? records.events : records.parts).set(std::string(name), std::move(fields));
     }
-    Dictionary inOrder;
-    for (auto& [name, fields] : records) inOrder.set(std::string(name), std::move(fields));
-    return inOrder;
+    return records;
 }
 
 } // namespace tavrin::ctl

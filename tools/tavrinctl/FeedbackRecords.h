@@ -23,7 +23,11 @@ struct ReportedEvent {
 /// each.
 [[nodiscard]] std::expected<std::vector<ReportedEvent>, std::vector<std::string>> eventsIn(const platform::Value& json);
 
-/// Returns the records that a client may report as {class: [fields]}.
-[[nodiscard]] platform::Dictionary reportableRecords();
+/// The records that a client may report, each as {class: {field: type in words}}.
+struct ReportableRecords {
+    platform::Dictionary events;
+    platform::Dictionary parts; ///< of events
+};
+[[nodiscard]] ReportableRecords reportableRecords();
 
 } // namespace tavrin::ctl
