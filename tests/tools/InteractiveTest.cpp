@@ -86,7 +86,7 @@ TEST(SearchScreen, FitsAnyWindow)
                     std::vector<KeyLine>(20, {"\"key\"", "cache          0.3 ms", "3 results, 1 set"})};
     view.text = "東京タワー " + std::string(300, 'x') + "éé";
     for (view.cursor = 0; view.cursor <= view.text.size(); view.cursor += view.text.size() / 4)
-        for (int columns = 1; columns < 100; columns += 3)
+        for (int columns = 1; columns < 100; columns += 7)
             for (int rows = 1; rows < 40; ++rows) {
                 const ScreenFrame frame = layOut(view, {columns, rows});
                 ASSERT_LE(frame.lines.size(), static_cast<std::size_t>(rows)) << columns << "×" << rows;

@@ -59,13 +59,16 @@ Snapshot::Directory lookAt(const std::string& name, fs::path path, bool isOurs)
 {
     Snapshot::Directory seen{.name = name, .path = path.string(), .problem = {}, .freeBytes = {}};
     struct stat status{};
-    while (lstat(path.c_str(), &status) != 0 && errno == ENOENT && path.has_parent_path() && path != "/") {
+    int failed = 0;
+    while ((failed = lstat(path.c_str(), &status)) != 0 && errno == ENOENT && path != "/") {
         path = path.parent_path();
         isOurs = false; // belongs to others, too
     }
     seen.mustBePrivate = isOurs;
     seen.mode = status.st_mode & 07777;
-    if (!S_ISDIR(status.st_mode) && !(S_ISLNK(status.st_mode) && fs::is_directory(path)))
+    if (failed != 0)
+        seen.problem = std::strerror(errno);
+    else if (!S_ISDIR(status.st_mode) && !(S_ISLNK(status.st_mode) && fs::is_directory(path)))
         seen.problem = "not a directory";
     else if (isOurs && status.st_uid != geteuid())
         seen.problem = "belongs to another user";
