@@ -85,7 +85,7 @@ struct SystemDevice::Impl {
           processes(makeProcessIdentity()), memoryPressure(makeMemoryPressure(runLoop)),
           notifier(makeSessionBusNotifier(runLoop, names.objectPath, names.notifyInterface)),
           ipc(ipc::makeBusTransport(runLoop, pool, *clock, directories.runtime / names.service)),
-          loader(makeCurlLoader()), network(makeNetworkManagerStatus(runLoop, *clock)),
+          loader(makeCurlLoader(pool, *clock)), network(makeNetworkManagerStatus(runLoop, *clock)),
           backgroundSessions(makeBackgroundSessions({.files = *files,
                                                      .loader = *loader,
                                                      .network = *network,

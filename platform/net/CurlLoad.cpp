@@ -20,6 +20,9 @@ namespace {
 /// Bytes of header fields of one load, over all hops. libcurl refuses a single line beyond 100 KiB.
 constexpr std::size_t kMaximumHeaderSize = 256u << 10;
 
+/// The largest receive buffer that libcurl allows. Memory is only used for what is received.
+constexpr std::size_t kLargestBuffer = CURL_MAX_READ_SIZE;
+
 } // namespace
 
 CurlLoad::CurlLoad(const UrlRequest& request, const UrlSessionConfiguration& configuration, const TransferFiles* files,
@@ -111,8 +114,13 @@ void CurlLoad::setOptions()
     set(CURLOPT_ERRORBUFFER, _errorText.data());
     set(CURLOPT_NOSIGNAL, 1L);
     set(CURLOPT_PROTOCOLS_STR, "http,https");
-    // Over HTTP/2, libcurl 7.88 loses a status that arrives before the body is sent if the stream is reset after it.
-    set(CURLOPT_HTTP_VERSION, static_cast<long>(hasUpload() ? CURL_HTTP_VERSION_1_1 : CURL_HTTP_VERSION_2TLS));
+    // Over HTTP/2, libcurl 7.88 loses a status that arrives before the body is sent if the stream is reset after it. It
+    // reads for all transfers of a connection at once, and if the buffer of one is full, leaves the rest unprocessed,
+    // an end of a response included, until the connection has more data. The buffer must hold a whole response.
+    const bool mayUseHttp2 = _hop.url.scheme() == "https" && !hasUpload() && maximumSize() <= kLargestBuffer;
+    set(CURLOPT_HTTP_VERSION, static_cast<long>(mayUseHttp2 ? CURL_HTTP_VERSION_2TLS : CURL_HTTP_VERSION_1_1));
+    if (mayUseHttp2)
+        set(CURLOPT_BUFFERSIZE, static_cast<long>(std::min(maximumSize() + kMaximumHeaderSize, kLargestBuffer)));
     // Over plain HTTP libcurl would delay every request until the first response.
     set(CURLOPT_PIPEWAIT, _configuration.pipelining && _files && _hop.url.scheme() == "https" ? 1L : 0L);
     set(CURLOPT_FRESH_CONNECT, _fresh ? 1L : 0L);

@@ -18,7 +18,7 @@ namespace platform {
 ///
 ///     prepare ──► [transfer ──► goesOn]… ──► finish
 ///
-/// Another hop follows a redirect, and a request that was lost on a reused connection. Loader's thread only.
+/// Another hop follows a redirect, and a request that was lost on a reused connection. Loader's queue only.
 class CurlLoad {
 public:
     using TimePoint = std::chrono::steady_clock::time_point;
@@ -33,8 +33,8 @@ public:
 
     /// Sets up the next hop on a new or reset handle. Returns false if it can't be sent; `finish` has the error.
     [[nodiscard]] bool prepare(CURL* easy);
-    /// Call this after a transfer has ended with `code`. Returns true if another hop follows: reset the handle and call
-    /// `prepare`.
+    /// Call this after a transfer has ended with `code`. Returns true if another hop follows: call `prepare` with
+    /// another handle.
     [[nodiscard]] bool goesOn(CURLcode code);
     /// Sets the time-out error. Call this at `deadline`.
     void timeOut(TimePoint now);

@@ -102,7 +102,7 @@ public:
 struct TransferFiles {
     FileHandle upload;   ///< the request's body, sent from its start; if empty, `UrlRequest::body` is sent
     FileHandle download; ///< an empty file for the response's body; if the handle is empty, the body is dropped
-    /// Called with the bytes of the upload sent so far. Runs on the loader's thread and must not block.
+    /// Called with the bytes of the upload sent so far. Runs on the loader's queue and must not block.
     std::function<void(std::uint64_t sent, std::uint64_t expected)> progress;
 };
 

@@ -2,21 +2,23 @@
 
 #include <algorithm>
 #include <atomic>
-#include <limits>
+#include <future>
 #include <map>
 #include <mutex>
-#include <pthread.h>
-#include <thread>
+#include <sys/epoll.h>
+#include <sys/timerfd.h>
 #include <vector>
 
 #include <curl/curl.h>
 
+#include "platform/base/FileHandle.h"
 #include "platform/base/Mutex.h"
 #include "platform/net/CurlLoad.h"
 #include "platform/net/HttpCache.h"
 #include "platform/net/UrlSession.h"
 #include "platform/net/UrlSessionCaching.h"
 #include "platform/run/Queue.h"
+#include "platform/run/WorkerPool.h"
 
 namespace platform {
 
@@ -30,41 +32,45 @@ constexpr std::size_t kMaximumInMemory = 24u << 20;
 
 class CurlTask;
 
-/// The URL-loading thread. Members marked "loader thread" are confined to it.
+/// Runs the loads of all sessions. libcurl's sockets and its timer are sources on a queue, which guards the multi
+/// handle and everything else here: members are confined to it, except for `start`, `cancel` and `stop`.
 class Loader : public std::enable_shared_from_this<Loader> {
 public:
-    Loader();
-    ~Loader();
+    Loader(WorkerPool& pool, Clock& clock);
 
     void start(std::shared_ptr<CurlTask> task);
     void cancel(std::shared_ptr<CurlTask> task);
-    /// Cancels every task and joins the thread.
+    /// Cancels every task, and blocks until libcurl is cleaned up. Later tasks are cancelled.
     void stop();
-    /// Bytes of incomplete bodies; loader thread.
+    /// Bytes of incomplete bodies.
     std::size_t bodiesInMemory = 0;
 
 private:
-    struct Command {
-        std::shared_ptr<CurlTask> task;
-        bool cancel;
-    };
-    void run();
-    void takeCommands();
+    using TimePoint = CurlLoad::TimePoint;
+
     void begin(const std::shared_ptr<CurlTask>& task);
+    void send(const std::shared_ptr<CurlTask>& task);
     void end(CURL* easy, CURLcode code, bool cancelled);
     [[nodiscard]] CURL* takeEasy();
     void giveBack(CURL* easy);
+    void act(curl_socket_t socket, int events);
+    void settle();
     void relieve();
-    [[nodiscard]] int nextTimeout();
-    [[nodiscard]] bool readOn();
+    void endLate(TimePoint now);
+    void setTimer();
+    void watch(curl_socket_t socket, int what);
 
-    CURLM* _multi;
-    Mutex _mutex;
-    std::vector<Command> _commands GUARDED_BY(_mutex);
-    bool _stopping GUARDED_BY(_mutex) = false;
-    std::thread _thread;                                // started under the mutex, joined once
-    std::map<CURL*, std::shared_ptr<CurlTask>> _active; // loader thread
-    std::vector<CURL*> _spare;                          // loader thread
+    WorkerPool& _pool;
+    const std::shared_ptr<Queue> _queue;
+    CURLM* const _multi;
+    std::map<curl_socket_t, std::unique_ptr<WorkerPool::Source>> _sockets;
+    const FileHandle _timerFd;
+    std::unique_ptr<WorkerPool::Source> _timer; // from the first load
+    std::optional<TimePoint> _curlDue;          // when libcurl wants to be called
+    std::optional<TimePoint> _timerDue;         // when the timer fires
+    std::map<CURL*, std::shared_ptr<CurlTask>> _active;
+    std::vector<CURL*> _spare;
+    bool _stopped = false;
 };
 
 /// One task; any thread.
@@ -100,7 +106,7 @@ public:
         return _timing;
     }
 
-    /// Exists while the loader runs the task. Loader thread.
+    /// Exists while the loader runs the task. Loader's queue.
     std::unique_ptr<CurlLoad> load;
 
     void beginLoad()
@@ -151,51 +157,59 @@ private:
     Value _timing GUARDED_BY(_timingMutex);
 };
 
-Loader::Loader() : _multi(curl_multi_init())
+Loader::Loader(WorkerPool& pool, Clock& clock)
+    : _pool(pool),
+      // Of high priority: a request is sent before the work that its client's call left behind.
+      _queue(Queue::make("url-loader", Queue::Kind::Serial, pool, clock, Rank::Root, Priority::High)),
+      _multi(curl_multi_init()), _timerFd(timerfd_create(CLOCK_MONOTONIC, TFD_CLOEXEC | TFD_NONBLOCK))
 {
     curl_multi_setopt(_multi, CURLMOPT_MAXCONNECTS, kIdleConnections);
-}
-
-Loader::~Loader()
-{
-    stop();
-    curl_multi_cleanup(_multi);
+    curl_multi_setopt(_multi, CURLMOPT_SOCKETDATA, this);
+    curl_multi_setopt(
+        _multi, CURLMOPT_SOCKETFUNCTION, +[](CURL*, curl_socket_t socket, int what, void* self, void*) {
+            static_cast<Loader*>(self)->watch(socket, what);
+            return 0;
+        });
+    curl_multi_setopt(_multi, CURLMOPT_TIMERDATA, this);
+    curl_multi_setopt(
+        _multi, CURLMOPT_TIMERFUNCTION, +[](CURLM*, long milliseconds, void* self) {
+            auto& due = static_cast<Loader*>(self)->_curlDue;
+            due = milliseconds < 0
+                      ? std::nullopt
+                      : std::optional(std::chrono::steady_clock::now() + std::chrono::milliseconds(milliseconds));
+            return 0;
+        });
 }
 
 void Loader::start(std::shared_ptr<CurlTask> task)
 {
-    bool taken = false;
-    {
-        MutexLock lock(_mutex);
-        if (!_stopping) {
-            _commands.push_back({task, false});
-            if (!_thread.joinable()) _thread = std::thread([this] { run(); });
-            taken = true;
-        }
-    }
-    if (!taken) return task->completeCancelled();
-    curl_multi_wakeup(_multi);
+    _queue->async([self = shared_from_this(), task = std::move(task)] {
+        self->begin(task);
+        self->settle();
+    });
 }
 
 void Loader::cancel(std::shared_ptr<CurlTask> task)
 {
-    {
-        MutexLock lock(_mutex);
-        if (_stopping) return;
-        _commands.push_back({std::move(task), true});
-    }
-    curl_multi_wakeup(_multi);
+    _queue->async([self = shared_from_this(), task = std::move(task)] {
+        if (task->load) self->end(task->load->easy(), CURLE_OK, true);
+        self->settle();
+    });
 }
 
 void Loader::stop()
 {
-    {
-        MutexLock lock(_mutex);
-        _stopping = true;
-        if (!_thread.joinable()) return;
-    }
-    curl_multi_wakeup(_multi);
-    _thread.join();
+    std::promise<void> stopped;
+    _queue->async([&] {
+        _stopped = true;
+        while (!_active.empty()) end(_active.begin()->first, CURLE_OK, true);
+        for (CURL* easy : _spare) curl_easy_cleanup(easy);
+        curl_multi_cleanup(_multi); // ends the watch of each socket
+        _timer.reset();
+        stopped.set_value();
+    });
+    WorkerPool::shareKeptJobs();
+    stopped.get_future().wait();
 }
 
 CURL* Loader::takeEasy()
@@ -210,30 +224,23 @@ void Loader::giveBack(CURL* easy)
 {
     constexpr std::size_t kSpareHandles = 8;
     curl_easy_reset(easy); // it refers to the load
-    if (_spare.size() == kSpareHandles) return curl_easy_cleanup(easy);
+    // A transfer that ended before others on its connection keeps its buffer, whose size is fixed.
+    const bool isClean = curl_easy_setopt(easy, CURLOPT_BUFFERSIZE, static_cast<long>(CURL_MAX_WRITE_SIZE)) == CURLE_OK;
+    if (!isClean || _spare.size() == kSpareHandles) return curl_easy_cleanup(easy);
     _spare.push_back(easy);
-}
-
-void Loader::takeCommands()
-{
-    std::vector<Command> commands;
-    {
-        MutexLock lock(_mutex);
-        commands.swap(_commands);
-    }
-    for (Command& command : commands) {
-        if (!command.cancel)
-            begin(command.task);
-        else if (command.task->load)
-            end(command.task->load->easy(), CURLE_OK, true);
-    }
 }
 
 void Loader::begin(const std::shared_ptr<CurlTask>& task)
 {
-    if (task->cancelled()) return task->completeCancelled();
-    CURL* easy = takeEasy();
+    if (task->cancelled() || _stopped) return task->completeCancelled();
     task->beginLoad();
+    send(task);
+}
+
+/// Sends a hop of the task's load.
+void Loader::send(const std::shared_ptr<CurlTask>& task)
+{
+    CURL* easy = takeEasy();
     if (easy && task->load->prepare(easy) && curl_multi_add_handle(_multi, easy) == CURLM_OK) {
         _active.emplace(easy, task);
         return;
@@ -249,14 +256,11 @@ void Loader::end(CURL* easy, CURLcode code, bool cancelled)
     const std::shared_ptr<CurlTask> task = found->second;
     const bool goesOn = !cancelled && task->load->goesOn(code);
     curl_multi_remove_handle(_multi, easy);
-    if (goesOn) {
-        curl_easy_reset(easy);
-        if (task->load->prepare(easy) && curl_multi_add_handle(_multi, easy) == CURLM_OK) return;
-        code = CURLE_FAILED_INIT;
-    }
     _active.erase(found);
     if (cancelled)
         task->completeCancelled();
+    else if (goesOn)
+        send(task);
     else
         task->complete(code);
     giveBack(easy);
@@ -273,84 +277,86 @@ void Loader::relieve()
     }
 }
 
-/// Ends the loads that have timed out, and returns the milliseconds until the next time-out.
-int Loader::nextTimeout()
+/// Passes a socket's events (CURL_CSELECT_…) to libcurl; for CURL_SOCKET_TIMEOUT, that its time has come.
+void Loader::act(curl_socket_t socket, int events)
 {
-    const auto now = std::chrono::steady_clock::now();
-    std::vector<CURL*> late;
-    auto next = now + std::chrono::hours(1);
-    for (const auto& [easy, task] : _active) {
-        const auto deadline = task->load->deadline();
-        if (deadline <= now)
-            late.push_back(easy);
-        else
-            next = std::min(next, deadline);
-    }
-    for (CURL* easy : late) {
-        _active.at(easy)->load->timeOut(now);
-        end(easy, CURLE_OPERATION_TIMEDOUT, false);
-    }
-    // Without a task there is no time-out. `start` and `cancel` interrupt the wait.
-    if (_active.empty()) return std::numeric_limits<int>::max();
-    return static_cast<int>(std::chrono::ceil<std::chrono::milliseconds>(next - now).count());
-}
-
-/// Makes every transfer process its buffered input; returns true if any received something. With HTTP/2, libcurl 7.88
-/// reads for all streams of a connection at once and may leave the end of one unprocessed until the connection has more
-/// data: without this, 7 of 40 lists of 24 images hung. Pausing and resuming a transfer makes libcurl process its
-/// input.
-bool Loader::readOn()
-{
-    const auto received = [this] {
-        curl_off_t all = 0;
-        for (const auto& [easy, task] : _active) {
-            curl_off_t size = 0;
-            long headers = 0;
-            curl_easy_getinfo(easy, CURLINFO_SIZE_DOWNLOAD_T, &size);
-            curl_easy_getinfo(easy, CURLINFO_HEADER_SIZE, &headers);
-            all += size + headers;
-        }
-        return all;
-    };
-    const curl_off_t before = received();
     int running = 0;
-    for (const auto& [easy, task] : _active) {
-        curl_easy_pause(easy, CURLPAUSE_RECV);
-        curl_easy_pause(easy, CURLPAUSE_CONT);
-        curl_multi_perform(_multi, &running);
-    }
-    return received() != before;
+    curl_multi_socket_action(_multi, socket, events, &running);
 }
 
-void Loader::run()
+/// After libcurl has returned: ends the loads that are done or late, lets libcurl do what is due, and sets the timer.
+void Loader::settle()
 {
-    constexpr int kQuiet = 2; // milliseconds
-    bool isQuiet = false;
-    bool mayBeUnread = false; // a transfer may have unprocessed data
-    pthread_setname_np(pthread_self(), "url-loader");
-    while (true) {
-        {
-            MutexLock lock(_mutex);
-            if (_stopping) break;
-        }
-        takeCommands();
-        mayBeUnread = mayBeUnread || (!isQuiet && _active.size() > 1);
-        int running = 0;
-        curl_multi_perform(_multi, &running);
+    constexpr int kTurns = 16; // then other tasks have theirs
+    if (_stopped) return;
+    for (int turn = 0; turn < kTurns; ++turn) {
         int left = 0;
         while (const CURLMsg* message = curl_multi_info_read(_multi, &left))
             if (message->msg == CURLMSG_DONE) end(message->easy_handle, message->data.result, false);
         relieve();
-        const int timeout = nextTimeout();
-        int ready = 0;
-        curl_multi_poll(_multi, nullptr, 0, mayBeUnread ? std::min(timeout, kQuiet) : timeout, &ready);
-        isQuiet = mayBeUnread && ready == 0;
-        if (isQuiet) mayBeUnread = readOn();
+        const auto now = std::chrono::steady_clock::now();
+        endLate(now);
+        if (!_curlDue || *_curlDue > now) return setTimer();
+        _curlDue.reset();
+        act(CURL_SOCKET_TIMEOUT, 0);
     }
-    takeCommands();
-    while (!_active.empty()) end(_active.begin()->first, CURLE_OK, true);
-    for (CURL* easy : _spare) curl_easy_cleanup(easy);
-    _spare.clear();
+    _queue->async([self = shared_from_this()] { self->settle(); });
+}
+
+/// Ends the loads that have timed out.
+void Loader::endLate(TimePoint now)
+{
+    std::vector<CURL*> late;
+    for (const auto& [easy, task] : _active)
+        if (task->load->deadline() <= now) late.push_back(easy);
+    for (CURL* easy : late) {
+        _active.at(easy)->load->timeOut(now);
+        end(easy, CURLE_OPERATION_TIMEDOUT, false);
+    }
+}
+
+/// Sets the timer to the next deadline, unless it fires before: deadlines mostly move on until then.
+void Loader::setTimer()
+{
+    if (_active.empty()) return;
+    TimePoint next = _curlDue.value_or(TimePoint::max());
+    for (const auto& [easy, task] : _active) next = std::min(next, task->load->deadline());
+    if (_timerDue && *_timerDue <= next) return;
+    if (!_timer) {
+        _timer = _pool.watch(_timerFd.fd(), _queue, [weak = weak_from_this()](std::uint32_t) {
+            const auto self = weak.lock();
+            if (!self) return;
+            self->_timerDue.reset();
+            self->settle();
+        });
+        _timer->setEvents(EPOLLIN | EPOLLET);
+    }
+    _timerDue = next;
+    const auto due = std::max<std::int64_t>(std::chrono::nanoseconds(next.time_since_epoch()).count(), 1); // 0 disarms
+    const itimerspec when{.it_interval = {},
+                          .it_value = {.tv_sec = due / 1'000'000'000, .tv_nsec = due % 1'000'000'000}};
+    timerfd_settime(_timerFd.fd(), TFD_TIMER_ABSTIME, &when, nullptr);
+}
+
+/// Watches a socket for what libcurl wants to know (CURL_POLL_…).
+void Loader::watch(curl_socket_t socket, int what)
+{
+    if (what == CURL_POLL_REMOVE) {
+        _sockets.erase(socket);
+        return;
+    }
+    auto& source = _sockets[socket];
+    if (!source)
+        source = _pool.watch(socket, _queue, [weak = weak_from_this(), socket](std::uint32_t events) {
+            const auto self = weak.lock();
+            if (!self) return;
+            // As libcurl itself understands errors of poll.
+            const bool reads = (events & (EPOLLIN | EPOLLHUP | EPOLLERR)) != 0;
+            const bool writes = (events & (EPOLLOUT | EPOLLERR)) != 0;
+            self->act(socket, (reads ? CURL_CSELECT_IN : 0) | (writes ? CURL_CSELECT_OUT : 0));
+            self->settle();
+        });
+    source->setEvents(((what & CURL_POLL_IN) != 0 ? EPOLLIN : 0u) | ((what & CURL_POLL_OUT) != 0 ? EPOLLOUT : 0u));
 }
 
 class CurlSession final : public UrlSession {
@@ -378,6 +384,7 @@ private:
 
 class CurlLoader final : public UrlLoader {
 public:
+    CurlLoader(WorkerPool& pool, Clock& clock) : _loader(std::make_shared<Loader>(pool, clock)) {}
     ~CurlLoader() override { _loader->stop(); }
     std::shared_ptr<UrlSession> makeSession(UrlSessionConfiguration configuration,
                                             std::shared_ptr<Queue> delegateQueue) override
@@ -389,16 +396,16 @@ public:
     }
 
 private:
-    std::shared_ptr<Loader> _loader = std::make_shared<Loader>();
+    const std::shared_ptr<Loader> _loader;
 };
 
 } // namespace
 
-std::unique_ptr<UrlLoader> makeCurlLoader()
+std::unique_ptr<UrlLoader> makeCurlLoader(WorkerPool& pool, Clock& clock)
 {
     static std::once_flag once;
     std::call_once(once, [] { curl_global_init(CURL_GLOBAL_DEFAULT); });
-    return std::make_unique<CurlLoader>();
+    return std::make_unique<CurlLoader>(pool, clock);
 }
 
 } // namespace platform

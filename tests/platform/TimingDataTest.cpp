@@ -54,7 +54,7 @@ TEST_F(TimingDataTest, MarksFollowTheOrderOfTheStages)
     } cases[]{{"/here", false, false, true},     {"/here", false, true, false},  {"/to-here", true, true, false},
               {"/to-there", true, false, false}, {"/to-here", true, true, true}, {"/to-there", true, false, true}};
     for (const auto& c : cases) {
-        if (c.cold) loader = makeCurlLoader();
+        if (c.cold) loader = makeCurlLoader(pool, clock);
         const double before = monotonicSeconds();
         const Value timing = load(server.url(c.path)).timing;
         const double after = monotonicSeconds();

@@ -300,7 +300,7 @@ TEST_F(CurlLoaderTest, PublicHostCannotLeadToAnInnerAddress)
 {
     constexpr const char* kPublic = "192.31.196.1"; // of a block without hosts
     bool possible = false;
-    // The servers' and the loader's threads are made on this one, and so are in its network.
+    // The servers' and the pool's threads are made on this one, and so are in its network.
     std::jthread([&] {
         possible = enterNetworkWithPublicAddress(kPublic);
         if (!possible) return;
@@ -475,7 +475,7 @@ TEST_F(CurlLoaderTest, CertificatesAreCheckedAndSessionsResumedWhereAllowed)
     TestHttpServer closing(always({httpAnswer(200, "safe"), Then::Close}), {.certificate = certificate()});
     EXPECT_EQ(load(closing.url()).code(), kUrlTlsFailed) << "nobody vouches for it";
     for (const bool tickets : {false, true}) {
-        loader = makeCurlLoader();
+        loader = makeCurlLoader(pool, clock);
         for (const bool second : {false, true}) {
             const Outcome outcome =
                 load(closing.url(), {.allowFastOpenAndTickets = tickets, .caFile = certificate().certificate});
@@ -514,7 +514,7 @@ TEST_F(CurlLoaderTest, CancelledTasksCompleteOnceWhenever)
     EXPECT_EQ(after.wait().body(), "end");
     after.task->cancel();
 
-    load(server.url("/end")); // the loader's thread has seen all commands by now
+    load(server.url("/end")); // the loader has seen all commands by now
     settle();
     EXPECT_EQ(before.completions() + running.completions() + after.completions(), 3);
     for (const auto& request : server.requests()) EXPECT_NE(request.target, "") << "all were whole";

@@ -75,7 +75,7 @@ struct UrlLoads : testing::Test {
     ManualClock clock;
     WorkerPool pool{2};
     std::shared_ptr<Queue> queue = Queue::make("test.delegate", Queue::Kind::Serial, pool, clock);
-    std::unique_ptr<UrlLoader> loader = makeCurlLoader();
+    std::unique_ptr<UrlLoader> loader = makeCurlLoader(pool, clock);
 };
 
 } // namespace platform::test

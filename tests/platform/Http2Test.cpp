@@ -1,0 +1,120 @@
+// Transfers that share a connection over HTTP/2.
+
+#include <algorithm>
+#include <random>
+#include <sys/mman.h>
+
+#include <gtest/gtest.h>
+
+#include "tests/support/TestHttpServer.h"
+#include "tests/support/UrlLoads.h"
+
+namespace platform {
+namespace {
+
+using namespace std::chrono_literals;
+using test::Load;
+using test::TestHttpServer;
+
+constexpr std::size_t kFrameHeader = 9;
+enum FrameType : char { kData = 0, kHeaders = 1, kSettings = 4 };
+constexpr char kEndOfStream = 1;
+constexpr char kEndOfHeaders = 4;
+constexpr char kAcknowledged = 1;
+
+std::string frame(FrameType type, char flags, std::uint32_t stream, std::string_view payload = {})
+{
+    const auto size = static_cast<std::uint32_t>(payload.size());
+    std::string frame{static_cast<char>(size >> 16), static_cast<char>(size >> 8), static_cast<char>(size), type,
+                      flags};
+    for (const int shift : {24, 16, 8, 0}) frame += static_cast<char>(stream >> shift);
+    return frame.append(payload);
+}
+
+/// A server that answers when it has `count` requests, with bodies of `size` bytes whose frames are mixed at random.
+class MixedAnswers {
+public:
+    MixedAnswers(std::size_t count, std::size_t size, unsigned seed) : _count(count), _size(size), _random(seed) {}
+
+    TestHttpServer::Answer operator()(const TestHttpServer::Request& request)
+    {
+        constexpr std::string_view kPreface = "PRI * HTTP/2.0\r\n\r\nSM\r\n\r\n";
+        std::string answer;
+        _input += request.body;
+        if (_input.starts_with(kPreface)) {
+            _input.erase(0, kPreface.size());
+            answer = frame(kSettings, 0, 0);
+        }
+        while (_input.size() >= kFrameHeader && _input.size() >= kFrameHeader + number(0, 3)) {
+            if (_input[3] == kHeaders) _streams.push_back({number(5, 4), _size});
+            if (_input[3] == kSettings && _input[4] != kAcknowledged) answer += frame(kSettings, kAcknowledged, 0);
+            _input.erase(0, kFrameHeader + number(0, 3));
+        }
+        if (_streams.size() == _count) answer += answers();
+        return {answer};
+    }
+
+private:
+    struct Stream {
+        std::uint32_t number;
+        std::size_t left;
+    };
+
+    [[nodiscard]] std::uint32_t number(std::size_t at, std::size_t bytes) const
+    {
+        std::uint32_t value = 0;
+        for (std::size_t i = at; i < at + bytes; ++i) value = value << 8 | static_cast<unsigned char>(_input[i]);
+        return value;
+    }
+
+    std::string answers()
+    {
+        constexpr std::string_view kStatus200 = "\x88"; // of HPACK's static table
+        std::string all;
+        for (const Stream& stream : _streams) all += frame(kHeaders, kEndOfHeaders, stream.number, kStatus200);
+        while (!_streams.empty()) {
+            const auto one = _streams.begin() + static_cast<std::ptrdiff_t>(_random() % _streams.size());
+            const std::size_t size = std::min<std::size_t>(one->left, 1 + _random() % 16384);
+            one->left -= size;
+            all += frame(kData, one->left == 0 ? kEndOfStream : 0, one->number, std::string(size, 'x'));
+            if (one->left == 0) _streams.erase(one);
+        }
+        return all;
+    }
+
+    const std::size_t _count, _size;
+    std::minstd_rand _random;
+    std::string _input;
+    std::vector<Stream> _streams;
+};
+
+using Http2Test = test::UrlLoads;
+
+// libcurl reads for all streams of a connection at once. If the buffer of one was full, the end of a stream was left
+// unprocessed in one list of five.
+TEST_F(Http2Test, EveryTransferOfAListEndsHoweverTheFramesAreMixed)
+{
+    constexpr std::size_t kTransfers = 24, kSize = 20'000;
+    for (unsigned seed = 0; seed < 40; ++seed) {
+        TestHttpServer server(MixedAnswers(kTransfers, kSize, seed),
+                              {.certificate = certificate(), .anyProtocol = true});
+        const auto session =
+            loader->makeSession({.requestTimeout = 5s, .pipelining = true, .caFile = certificate().certificate}, queue);
+        std::vector<std::unique_ptr<Load>> loads;
+        for (std::size_t i = 0; i < kTransfers; ++i) {
+            TransferFiles files;
+            files.download = FileHandle(memfd_create("download", MFD_CLOEXEC));
+            loads.push_back(std::make_unique<Load>(*session, UrlRequest{.url = server.url()}, queue, std::move(files)));
+        }
+        for (const auto& load : loads) load->task->resume();
+        for (const auto& load : loads) {
+            const test::Outcome outcome = load->wait();
+            EXPECT_EQ(outcome.code(), 0) << "seed " << seed << ": " << outcome.why();
+            EXPECT_EQ(outcome.status(), 200);
+        }
+        EXPECT_EQ(server.connections(), 1);
+    }
+}
+
+} // namespace
+} // namespace platform
