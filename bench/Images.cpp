@@ -65,6 +65,7 @@ public:
             curl_easy_setopt(easy, CURLOPT_CAINFO, caFile.c_str());
             curl_easy_setopt(easy, CURLOPT_HTTP_VERSION, static_cast<long>(CURL_HTTP_VERSION_2TLS));
             curl_easy_setopt(easy, CURLOPT_PIPEWAIT, 1L);
+            curl_easy_setopt(easy, CURLOPT_BUFFERSIZE, static_cast<long>(CURL_MAX_READ_SIZE)); // as the daemon does
             curl_easy_setopt(easy, CURLOPT_WRITEDATA, &body);
             curl_easy_setopt(
                 easy, CURLOPT_WRITEFUNCTION, +[](char* data, std::size_t size, std::size_t count, void* body_) {
@@ -87,14 +88,7 @@ public:
         }
         for (int running = 1; running > 0;) {
             if (curl_multi_perform(_multi, &running) != CURLM_OK) std::abort();
-            int ready = 0;
-            if (running > 0) curl_multi_poll(_multi, nullptr, 0, 2, &ready);
-            if (running == 0 || ready > 0) continue;
-            for (CURL* easy : _easies) { // libcurl 7.88 may have read what it doesn't tell: as the daemon does
-                curl_easy_pause(easy, CURLPAUSE_RECV);
-                curl_easy_pause(easy, CURLPAUSE_CONT);
-                if (curl_multi_perform(_multi, &running) != CURLM_OK) std::abort();
-            }
+            if (running > 0) curl_multi_poll(_multi, nullptr, 0, 2, nullptr); // libcurl 7.88 can lose a wake-up
         }
         for (std::size_t i = 0; i < urls.size(); ++i) {
             long version = 0;
