@@ -1,19 +1,19 @@
-// Searches for the words of the command line and prints the service's JSON.
-#include <cstdio>
+// The README's first client in C++.
+#include <iostream>
 
 #include "CoreTavrin/TAVClient.h"
 #include "CoreTavrin/TAVReply.h"
 #include "CoreTavrin/TAVRequest.h"
 #include "CoreTavrin/TAVSessionConfiguration.h"
 
-int main(int argc, char** argv)
+int main()
 {
-    using namespace tavrin;
-    const auto client = TAVClient::connect();
-    if (argc < 2 || !client || !(*client)->configure({"com.example.first", "First/1"})) return 1;
-    const auto request = TAVSearchRequest::searchRequestWithString(argv[1], StartSearchTrigger::NewCharacter);
-    request->queryId = 1;
-    const auto answer = (*client)->request(*request);
+    const auto client = tavrin::TAVClient::connect();
+    if (!client || !(*client)->configure({"com.example.first", "First/1"})) return 1;
+    const auto search =
+        tavrin::TAVSearchRequest::searchRequestWithString("weather", tavrin::StartSearchTrigger::NewCharacter);
+    search->queryId = 1;
+    const auto answer = (*client)->request(*search);
     if (!answer || !answer->reply || !answer->reply->rawResponse) return 1;
-    std::printf("%s\n", std::string(answer->reply->rawResponse->view()).c_str());
+    std::cout << answer->reply->rawResponse->view() << '\n'; // the service's JSON
 }
