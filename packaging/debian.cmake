@@ -47,7 +47,8 @@ The Python package tavrin, an extension with its native messaging host for
 the address field of Chromium and Firefox, and a search provider for the
 desktop's search screens."
   PACKAGE_ARCHITECTURE all
-  PACKAGE_DEPENDS "tavrind (>= ${PROJECT_VERSION}), python3 (>= 3.11), python3-jeepney"
+  PACKAGE_DEPENDS "tavrind (>= ${PROJECT_VERSION}), python3 (>= 3.11), python3-jeepney, python3-pil"
+  PACKAGE_RECOMMENDS "dbus-user-session, xdg-utils"
   PACKAGE_SUGGESTS "chromium | firefox-esr, gnome-shell | plasma-workspace")
 set(CPACK_DEBIAN_TAVRIN-CLIENTS_PACKAGE_CONTROL_EXTRA
     ${CMAKE_CURRENT_SOURCE_DIR}/clients/conffiles ${CMAKE_CURRENT_SOURCE_DIR}/clients/postinst
