@@ -37,8 +37,6 @@ class Schedule {
 public:
     Schedule(DaemonTest& test, std::uint32_t seed) : _test(test), _random(seed), _name(std::to_string(seed))
     {
-        if (const auto first = _test.tasks().empty() ? nullptr : _test.tasks().front(); first && !first->finished)
-            _bag = first;
         for (int i = 0; i < 2; ++i) connect(_users.emplace_back());
     }
 
@@ -49,7 +47,7 @@ public:
             _test.device.drain();
             judge();
         }
-        deliverBag();
+        while (deliverBag()) {}
         while (auto task = anyTask()) {
             respond(*task);
             _test.device.drain();
@@ -95,17 +93,20 @@ private:
         user = User();
     }
 
-    /// Until then every connection is suspended with its first search.
-    void deliverBag()
+    /// Answers a request for the bag. Until the first one, every connection is suspended with its first search.
+    bool deliverBag()
     {
-        if (!_bag) return;
-        std::exchange(_bag, nullptr)->respond(200, DaemonTest::kBag);
+        const auto bag = std::ranges::find_if(_test.tasks(),
+                                              [](const auto& task) { return !task->finished && !searchedFor(*task); });
+        if (bag == _test.tasks().end()) return false;
+        (*bag)->respond(200, DaemonTest::kBag);
         _test.device.drain();
+        return true;
     }
 
     void step()
     {
-        if (_bag && oneIn(8)) return deliverBag();
+        if (oneIn(8) && deliverBag()) return;
         switch (upTo(19)) {
         case 0: _test.device.advance(std::chrono::seconds(upTo(40))); break;
         case 1: {
@@ -233,8 +234,7 @@ private:
     std::mt19937 _random;
     const std::string _name;
     std::vector<User> _users;
-    std::vector<Call> _gone;    // of connections that ended
-    std::shared_ptr<Task> _bag; // the first one, until it is delivered
+    std::vector<Call> _gone; // of connections that ended
 
 public:
     int hits = 0;
