@@ -2,7 +2,10 @@
 
 #include <cerrno>
 #include <mutex>
+#include <utility>
 #include <vector>
+
+#include <fmt/format.h>
 
 #include "platform/base/Log.h"
 #include "platform/base/Mutex.h"
@@ -20,36 +23,45 @@ constexpr std::size_t kMaximumProfileSize = 1u << 20;
 constexpr double kSmallestScale = 0.5;
 constexpr double kLargestScale = 8;
 
-/// Removes a member and returns it; null if it is missing.
-Value take(Dictionary& members, std::string_view key)
-{
-    const Value* found = members.find(key);
-    Value value = found ? *found : Value();
-    members.remove(key);
-    return value;
-}
+/// The members of one object of the file that have not been read yet.
+struct Members {
+    Dictionary left;
+    std::vector<std::string>& problems;
 
-/// Logs a member that is there and doesn't fit.
-void expect(bool fits, std::string_view key, const Value& value, std::string_view expected)
-{
-    if (!fits && !value.isNull()) defaultLog().error("device.json: {}: expected {}", key, expected);
-}
-
-std::optional<std::string> text(Dictionary& members, std::string_view key)
-{
-    const Value value = take(members, key);
-    const std::string* string = value.asString();
-    expect(string, key, value, "a string");
-    return string && !string->empty() ? std::optional(*string) : std::nullopt;
-}
-
-bool flag(Dictionary& members, std::string_view key)
-{
-    const Value value = take(members, key);
-    const auto truth = value.asBool();
-    expect(truth.has_value(), key, value, "true or false");
-    return truth.value_or(false);
-}
+    Members(const Value& object, std::vector<std::string>& problems_)
+        : left(object.asDictionary() ? *object.asDictionary() : Dictionary()), problems(problems_)
+    {}
+    /// Removes a member and returns it; null if it is missing.
+    Value take(std::string_view key)
+    {
+        const Value* found = left.find(key);
+        Value value = found ? *found : Value();
+        left.remove(key);
+        return value;
+    }
+    void expect(bool fits, std::string_view key, const Value& value, std::string_view expected)
+    {
+        if (!fits && !value.isNull()) problems.push_back(fmt::format("{}: expected {}", key, expected));
+    }
+    std::optional<std::string> text(std::string_view key)
+    {
+        const Value value = take(key);
+        const std::string* string = value.asString();
+        expect(string, key, value, "a string");
+        return string && !string->empty() ? std::optional(*string) : std::nullopt;
+    }
+    bool flag(std::string_view key)
+    {
+        const Value value = take(key);
+        const auto truth = value.asBool();
+        expect(truth.has_value(), key, value, "true or false");
+        return truth.value_or(false);
+    }
+    void end()
+    {
+        for (const auto& [key, member] : left) problems.push_back(fmt::format("{}: there is no such member", key));
+    }
+};
 
 class FileProfile final : public DeviceProfileSource {
 public:
@@ -88,7 +100,11 @@ private:
         }
         const auto value = parseJson(bytes->view(), kMaximumProfileSize);
         if (!value) defaultLog().error("device.json is broken: {}", value.error().description());
-        return value ? deviceProfileFromValue(*value) : DeviceProfile();
+        if (!value) return {};
+        std::vector<std::string> problems;
+        DeviceProfile profile = deviceProfileFromValue(*value, problems);
+        for (const std::string& problem : problems) defaultLog().error("device.json: {}", problem);
+        return profile;
     }
 
     void changed()
@@ -115,29 +131,29 @@ private:
 
 } // namespace
 
-DeviceProfile deviceProfileFromValue(const Value& value)
+DeviceProfile deviceProfileFromValue(const Value& value, std::vector<std::string>& problems)
 {
-    if (!value.asDictionary()) defaultLog().error("device.json: expected an object");
-    Dictionary members = value.asDictionary() ? *value.asDictionary() : Dictionary();
+    if (!value.asDictionary()) problems.emplace_back("expected an object");
+    Members members(value, problems);
     DeviceProfile profile;
-    profile.countryCode = text(members, "countryCode");
-    profile.storefront = text(members, "storefront");
-    profile.managedAccount = flag(members, "managedAccount");
-    profile.newsSubscribed = flag(members, "newsSubscribed");
-    const Value scale = take(members, "screenScale");
+    profile.countryCode = members.text("countryCode");
+    profile.storefront = members.text("storefront");
+    profile.managedAccount = members.flag("managedAccount");
+    profile.newsSubscribed = members.flag("newsSubscribed");
+    const Value scale = members.take("screenScale");
     const double number = scale.asDouble().value_or(0);
     const bool inRange = number >= kSmallestScale && number <= kLargestScale;
-    expect(inRange, "screenScale", scale, "a number from 0.5 to 8");
+    members.expect(inRange, "screenScale", scale, fmt::format("a number from {} to {}", kSmallestScale, kLargestScale));
     if (inRange) profile.screenScale = number;
-    profile.geoMetadata = text(members, "geoMetadata");
-    profile.geoEnvironment = text(members, "geoEnvironment");
-    const Value geoSession = take(members, "geoSession");
-    expect(geoSession.asDictionary(), "geoSession", geoSession, "an object");
-    Dictionary session = geoSession.asDictionary() ? *geoSession.asDictionary() : Dictionary();
-    profile.geoSessionId = text(session, "id");
-    profile.geoSessionEntity = text(session, "entity");
-    for (const Dictionary& unknown : {members, session})
-        for (const auto& [key, member] : unknown) defaultLog().error("device.json: {}: there is no such member", key);
+    profile.geoMetadata = members.text("geoMetadata");
+    profile.geoEnvironment = members.text("geoEnvironment");
+    const Value geoSession = members.take("geoSession");
+    members.expect(geoSession.asDictionary(), "geoSession", geoSession, "an object");
+    Members session(geoSession, problems);
+    profile.geoSessionId = session.text("id");
+    profile.geoSessionEntity = session.text("entity");
+    session.end();
+    members.end();
     return profile;
 }
 

@@ -5,6 +5,7 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <vector>
 
 #include "platform/values/Value.h"
 
@@ -28,8 +29,9 @@ struct DeviceProfile {
     bool operator==(const DeviceProfile&) const = default;
 };
 
-/// Reads a profile. Members of the wrong type and unknown ones are logged, and count as missing.
-[[nodiscard]] DeviceProfile deviceProfileFromValue(const Value& value);
+/// Reads a profile. Members of the wrong type and unknown ones count as missing, and are added to `problems`:
+/// "countryCode: expected a string".
+[[nodiscard]] DeviceProfile deviceProfileFromValue(const Value& value, std::vector<std::string>& problems);
 
 /// Reports the profile and its changes. Any thread.
 class DeviceProfileSource {

@@ -124,6 +124,8 @@ TEST(Doctor, FindsEachThingThatIsBrokenAndSaysWhatToDo)
          "Repair"},
         {[](Snapshot& s) { s.unknownSettings = {"the daemon knows no setting X"}; }, kWarning, "settings", "setting X",
          "defaults list"},
+        {[](Snapshot& s) { s.profileProblems = {"country: there is no such member"}; }, kWarning, "settings",
+         "device.json: country", "Correct it"},
         {upload(R"({"waitsFor": "time", "inSeconds": 65, "failures": 2, "problem": "refused", "note": {"events": 7}})"),
          kWarning, "transfers",
          "1 uploads waiting after a failure (refused), with 7 events; the next attempt is in 1 min", "tried again"},

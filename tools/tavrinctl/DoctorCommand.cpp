@@ -15,6 +15,7 @@
 #include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVSettings.h"
 #include "platform/base/Log.h"
+#include "platform/device/DeviceProfile.h"
 #include "platform/files/Files.h"
 #include "platform/files/Sqlite.h"
 #include "platform/values/Dictionary.h"
@@ -152,6 +153,17 @@ std::vector<std::string> unknownSettingsIn(const platform::Directories& director
     return notes;
 }
 
+std::vector<std::string> profileProblemsIn(const platform::Directories& directories)
+{
+    std::vector<std::string> problems;
+    const auto bytes =
+        platform::makeSystemFiles()->read(directories.config / kServiceName / "device.json", kLargestStore);
+    // A file that can't be parsed is a problem of the stores.
+    if (const auto profile = bytes ? platform::parseJson(bytes->view()).value_or(Value()) : Value(); !profile.isNull())
+        (void)platform::deviceProfileFromValue(profile, problems);
+    return problems;
+}
+
 Snapshot::Host resolve(const std::string& name)
 {
     addrinfo* found = nullptr;
@@ -216,6 +228,7 @@ Snapshot takeSnapshot(const Options& options)
     snapshot.files = lookAtFiles(directories);
     snapshot.sessionFiles = lookAtSessions(directories, snapshot.now);
     snapshot.unknownSettings = unknownSettingsIn(directories);
+    snapshot.profileProblems = profileProblemsIn(directories);
     snapshot.authorities = lookAtAuthorities(snapshot.status);
     return snapshot;
 }

@@ -223,6 +223,9 @@ private:
     {
         for (const std::string& note : _snapshot.unknownSettings)
             find(Severity::Warning, "settings", printable(note), "tavrinctl defaults list");
+        for (const std::string& problem : _snapshot.profileProblems)
+            find(Severity::Warning, "settings", "device.json: " + printable(problem),
+                 "Correct it; until then it counts as missing.");
         fineUnlessFound("settings", "the daemon knows all that are set");
     }
 

@@ -45,8 +45,9 @@ struct Snapshot {
     platform::Value waiting;
     std::vector<std::string> bagProblems;
     std::vector<std::string> unknownSettings;
-    std::vector<Host> hosts; ///< of the bag and of its URLs
-    File authorities;        ///< certification authorities
+    std::vector<std::string> profileProblems; ///< of device.json
+    std::vector<Host> hosts;                  ///< of the bag and of its URLs
+    File authorities;                         ///< certification authorities
     std::vector<Directory> directories;
     std::vector<File> files;
     std::vector<SessionFile> sessionFiles;
