@@ -315,13 +315,14 @@ void Loader::endLate(TimePoint now)
     }
 }
 
-/// Sets the timer to the next deadline, unless it fires before: deadlines mostly move on until then.
+/// Sets the timer to the next deadline, unless it fires before: deadlines mostly move on until then. Stops it if there
+/// is no load, so that an idle process isn't woken.
 void Loader::setTimer()
 {
-    if (_active.empty()) return;
+    const bool isIdle = _active.empty();
     TimePoint next = _curlDue.value_or(TimePoint::max());
     for (const auto& [easy, task] : _active) next = std::min(next, task->load->deadline());
-    if (_timerDue && *_timerDue <= next) return;
+    if (isIdle ? !_timerDue : _timerDue && *_timerDue <= next) return;
     if (!_timer) {
         _timer = _pool.watch(_timerFd.fd(), _queue, [weak = weak_from_this()](std::uint32_t) {
             const auto self = weak.lock();
@@ -331,8 +332,8 @@ void Loader::setTimer()
         });
         _timer->setEvents(EPOLLIN | EPOLLET);
     }
-    _timerDue = next;
-    const auto due = std::max<std::int64_t>(std::chrono::nanoseconds(next.time_since_epoch()).count(), 1); // 0 disarms
+    _timerDue = isIdle ? std::nullopt : std::optional(next);
+    const std::int64_t due = isIdle ? 0 : std::chrono::nanoseconds(next.time_since_epoch()).count(); // 0 stops it
     const itimerspec when{.it_interval = {},
                           .it_value = {.tv_sec = due / 1'000'000'000, .tv_nsec = due % 1'000'000'000}};
     timerfd_settime(_timerFd.fd(), TFD_TIMER_ABSTIME, &when, nullptr);
