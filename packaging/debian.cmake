@@ -56,9 +56,10 @@ set(CPACK_DEBIAN_TAVRIN-CLIENTS_PACKAGE_CONTROL_EXTRA
 
 package(tavrin-devtools devel "development service and replayer for the search daemon tavrind
 tavrin-devserver is a search service for development: it serves a catalogue
-over HTTPS, fails on demand and shows what was uploaded. tavrin-replay types
-a corpus of queries into a running daemon and reports how it answered."
+over HTTPS, fails on demand and shows what was uploaded, also on a console
+page. tavrin-replay types a corpus of queries into a running daemon and
+reports how it answered."
   PACKAGE_SHLIBDEPS ON
-  PACKAGE_SUGGESTS "tavrind")
+  PACKAGE_SUGGESTS "tavrind, libjs-chart.js")
 
 include(CPack)

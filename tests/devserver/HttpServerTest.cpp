@@ -67,7 +67,8 @@ TEST_F(HttpServerTest, BodiesAreCutPaddedOrGoOn)
         Answer answer{.body = "0123456789"};
         answer.cut = request.path.contains("cut");
         if (request.path.contains("padded")) answer.paddedTo = 200'000;
-        if (request.path == "/on") answer.goesOn = [left = 2]() mutable { return left-- > 0; };
+        if (request.path == "/on")
+            answer.more = [left = 2]() mutable { return left-- > 0 ? std::optional<std::string>(" ") : std::nullopt; };
         return answer;
     });
     const std::pair<const char*, std::string> cases[]{

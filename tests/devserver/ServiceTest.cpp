@@ -1,5 +1,6 @@
 #include "tools/devserver/Service.h"
 
+#include <fmt/format.h>
 #include <gtest/gtest.h>
 
 #include "platform/values/Dictionary.h"
@@ -66,7 +67,7 @@ TEST_F(ServiceTest, TheResourceAtHandIsNotSentAgainWhateverTheFault)
         ASSERT_TRUE(service.faults.add("resource", fault, 1));
         const Answer answer = service.answer(call);
         EXPECT_EQ(answer.status, 304);
-        EXPECT_TRUE(answer.body.empty() && answer.paddedTo == 0 && !answer.cut && !answer.goesOn) << fault;
+        EXPECT_TRUE(answer.body.empty() && answer.paddedTo == 0 && !answer.cut && !answer.more) << fault;
     }
     call.headers = {{"If-None-Match", "2"}};
     EXPECT_EQ(service.answer(call).status, 200);
@@ -89,6 +90,108 @@ TEST_F(ServiceTest, ControlRefusesWhatItDoesNotKnowAndStrangers)
     call.peer = "::1";
     call.secure = true;
     EXPECT_EQ(service.answer(call).status, 404) << "over plain HTTP only";
+}
+
+TEST_F(ServiceTest, OtherWebPagesControlNothing)
+{
+    const struct {
+        Headers headers;
+        int control, console;
+    } cases[]{
+        {{{"Host", "127.0.0.1:8080"}}, 200, 200},
+        {{{"Host", "LOCALHOST"}, {"Origin", "http://LOCALHOST"}, {"Sec-Fetch-Site", "same-origin"}}, 200, 200},
+        {{{"Host", "[::1]:8080"}, {"Sec-Fetch-Site", "none"}}, 200, 200},
+        // Of another origin; links to the page are harmless.
+        {{{"Host", "127.0.0.1:8080"}, {"Origin", "https://evil.example"}}, 403, 200},
+        {{{"Host", "127.0.0.1:8080"}, {"Origin", "http://127.0.0.1:9090"}}, 403, 200},
+        {{{"Host", "127.0.0.1:8080"}, {"Origin", "null"}}, 403, 200},
+        {{{"Host", "127.0.0.1:8080"}, {"Sec-Fetch-Site", "cross-site"}}, 403, 200},
+        {{{"Host", "127.0.0.1:8080"}, {"Sec-Fetch-Site", "same-site"}}, 403, 200},
+        // Of a name that somebody has made to resolve to this machine.
+        {{{"Host", "evil.example:8080"}, {"Origin", "http://evil.example:8080"}}, 403, 403},
+        {{{"Host", "127.evil.example"}}, 403, 403},
+        {{{"Host", "localhost.evil.example"}}, 403, 403},
+        {{{"Host", "192.0.2.1"}}, 403, 403},
+        {{{"Host", "[2001:db8::1]"}}, 403, 403},
+        {{{"Host", ""}}, 403, 403},
+    };
+    for (const auto& c : cases) {
+        for (const auto& [path, status] : {std::pair("/control/bag/bump", c.control), {"/console", c.console}}) {
+            Request call = request(path[4] == 't' ? "POST" : "GET", path);
+            call.headers = c.headers;
+            const std::int64_t before = service.bag.version();
+            EXPECT_EQ(service.answer(call).status, status) << path << c.headers[0].second << c.headers.back().second;
+            EXPECT_TRUE(status == 200 || service.bag.version() == before);
+        }
+    }
+}
+
+TEST_F(ServiceTest, TheConsoleRunsOnlyItsOwnScripts)
+{
+    const Answer page = get("/console");
+    EXPECT_TRUE(page.contentType.starts_with("text/html"));
+    const std::string policy = *findHeader(page.headers, "Content-Security-Policy");
+    EXPECT_TRUE(policy.starts_with("default-src 'none'; script-src 'self';") && !policy.contains("unsafe")) << policy;
+    EXPECT_EQ(*findHeader(page.headers, "X-Content-Type-Options"), "nosniff");
+    const std::string_view body = page.body;
+    for (std::size_t at = 0; (at = body.find("/console/", at)) != body.npos; ++at) {
+        const Answer file = get(body.substr(at, body.find('"', at) - at));
+        EXPECT_TRUE(file.status == 200 && !file.body.empty()) << body.substr(at, 30);
+    }
+    for (const char* document : {"requests", "bag", "feedback", "devserver"})
+        EXPECT_TRUE(get(fmt::format("/console/{}.md", document)).body.starts_with("# ")) << "explains what is shown";
+    for (const char* path : {"/console/nothing.js", "/console/../../etc/passwd", "/console//etc/passwd", "/consoles"})
+        EXPECT_EQ(get(path).status, 404) << path;
+}
+
+TEST_F(ServiceTest, TheStreamDeliversWhatChanged)
+{
+    (void)get("/bag");
+    const Answer stream = get("/control/events");
+    ASSERT_TRUE(stream.more);
+    EXPECT_EQ(stream.contentType, "text/event-stream");
+    const auto next = [&stream] {
+        const std::string text = stream.more().value_or("");
+        EXPECT_TRUE(text.starts_with("data: ") && text.ends_with("\n\n")) << text;
+        return platform::parseJson(text.substr(std::min<std::size_t>(text.size(), 6))).value_or(Value());
+    };
+    const Value all = next();
+    EXPECT_EQ(all["requests"].count(), 1u);
+    EXPECT_EQ(all["state"]["status"]["requests"], Value(1));
+    ASSERT_TRUE(service.faults.add("search", "delay:0,status:503", 1));
+    EXPECT_EQ(next()["state"]["faults"][0]["fault"], Value("delay:0,status:503"));
+    (void)get("/search?q=weather");
+    const Value search = next()["requests"];
+    EXPECT_EQ(search.count(), 1u);
+    EXPECT_EQ(search[0]["endpoint"], Value("search"));
+    EXPECT_EQ(search[0]["status"], Value(503));
+    EXPECT_EQ(search[0]["faults"], Value("delay:0,status:503"));
+    (void)service.answer(request("POST", "/control/bag", R"({"isEnabled": false})"));
+    EXPECT_FALSE(next().asDictionary()->contains("requests"));
+    (void)service.answer(request("POST", "/control/reset"));
+    EXPECT_EQ(next()["first"], Value(3)) << "the requests before are gone";
+    service.stop();
+    EXPECT_EQ(stream.more(), std::nullopt);
+}
+
+TEST_F(ServiceTest, StreamsAreLimitedAndEndWithTheirConnections)
+{
+    std::vector<Answer> streams;
+    while (streams.size() < 100 && (streams.empty() || streams.back().status == 200))
+        streams.push_back(get("/control/events"));
+    EXPECT_EQ(streams.back().status, 503);
+    streams.clear();
+    EXPECT_EQ(get("/control/events").status, 200);
+}
+
+TEST_F(ServiceTest, TheBagIsCheckedByTheDaemonsRules)
+{
+    const auto checked = [this](const char* bag) {
+        return platform::toJson(json(service.answer(request("POST", "/control/bag/check", bag)))["problems"]);
+    };
+    EXPECT_EQ(checked(R"({"isEnabled": true, "clients": {"news": {}}})"), "[]");
+    EXPECT_TRUE(checked(R"({"isEnabled": "yes"})").contains("isEnabled"));
+    EXPECT_EQ(platform::toJson(json(get("/control/bag"))["problems"]), "[]") << "its own bag is right";
 }
 
 TEST_F(ServiceTest, TheLogShowsRequestsButNoControlCallsAndNoSecrets)

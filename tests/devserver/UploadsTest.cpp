@@ -86,5 +86,30 @@ TEST(Uploads, SaysWhatIsWrongWithABody)
     EXPECT_EQ(checkUpload(uploadOf("/crowdsourcing", "{}", sha512("{}"))).problem, std::nullopt) << "any object";
 }
 
+TEST(Uploads, ASessionSaysWhatWasSentAndWhatCameFromMemory)
+{
+    const std::string text =
+        R"({"fb":[{"endpoint_type":"tavrin_image","type":"network_search_start","timestamp":0},)"
+        R"({"network_timing_data":[["ResponseEnd",9]],"type":"network_search_end","timestamp":9},)"
+        R"({"endpoint_type":"tavrin_search","type":"network_search_start","timestamp":10},)"
+        R"({"network_timing_data":[["FetchStart",0],["ResponseEnd",50]],"fbq":"n","type":"network_search_end",)"
+        R"("timestamp":50},{"network_timing_data":null,"fbq":"n","type":"network_search_end","timestamp":60},)"
+        R"({"network_timing_data":["ResponseEnd",7],"fbq":"n","type":"network_search_end","timestamp":60},)"
+        R"({"uuid":"U","type":"unknown","timestamp":70},{"type":"unknown","timestamp":80}],)"
+        R"("agent":"Vistrel/4","user_guid":"G"})";
+    Uploads uploads;
+    for (const std::string& json : {std::string("7"), text}) {
+        Upload upload = checkUpload(uploadOf("/feedback", json, sha512(json)));
+        const Answer answer = upload.answer();
+        uploads.add(std::move(upload), answer);
+    }
+    const auto figures = [&](std::size_t i) { return platform::toJson(uploads.summaries()[i]["searches"]); };
+    EXPECT_EQ(figures(0), R"({"sent":0,"from_memory":0,"latencies":[]})");
+    EXPECT_EQ(figures(1), R"({"sent":1,"from_memory":1,"latencies":[50]})");
+    EXPECT_FALSE(uploads.summaries()[1].asDictionary()->contains("json"));
+    EXPECT_EQ(uploads.find(2)["json"]["agent"], Value("Vistrel/4"));
+    EXPECT_TRUE(uploads.find(3).isNull());
+}
+
 } // namespace
 } // namespace devserver

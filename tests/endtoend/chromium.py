@@ -8,17 +8,19 @@ from house import TIMEOUT, Failure, check
 
 
 class Chromium:
-    """Debian's Chromium with one extension. Every host name but those of this machine is unknown to it."""
+    """Debian's Chromium, with an extension or without. Every host name but those of this machine is unknown to it."""
 
-    def __init__(self, house, extension):
+    def __init__(self, house, extension=None):
         self.profile = house.directory("chromium")
+        self.events = []  # those of the domains that a case enables
         self._house, self._number, self._buffer = house, 0, b""
+        extensions = [f"--load-extension={extension}", f"--disable-extensions-except={extension}"] if extension else []
         pipes = [os.pipe(), os.pipe()]  # commands, answers
         theirs = [fcntl.fcntl(pipes[0][0], fcntl.F_DUPFD, 10), fcntl.fcntl(pipes[1][1], fcntl.F_DUPFD, 10)]
         self._process = subprocess.Popen(
             ["chromium", "--headless=new", "--no-sandbox", "--disable-gpu", "--no-first-run", "--remote-debugging-pipe",
              "--host-resolver-rules=MAP * ~NOTFOUND, EXCLUDE 127.0.0.1", f"--user-data-dir={self.profile}",
-             f"--load-extension={extension}", f"--disable-extensions-except={extension}", "about:blank"],
+             *extensions, "about:blank"],
             env=dict(house.environment, HOME=self.profile), pass_fds=(3, 4), stdout=subprocess.DEVNULL,
             stderr=subprocess.DEVNULL, preexec_fn=lambda: (os.dup2(theirs[0], 3), os.dup2(theirs[1], 4)))
         for descriptor in [*theirs, pipes[0][0], pipes[1][1]]:
@@ -26,7 +28,7 @@ class Chromium:
         self._commands, self._answers = os.fdopen(pipes[0][1], "wb", 0), os.fdopen(pipes[1][0], "rb", 0)
 
     def call(self, method, session=None, **parameters):
-        """Performs a command of the protocol and returns its result. Events are skipped."""
+        """Performs a command of the protocol and returns its result."""
         self._number += 1
         command = {"id": self._number, "method": method, "params": parameters, **({"sessionId": session} if session else {})}
         self._commands.write(json.dumps(command).encode() + b"\0")
@@ -40,6 +42,8 @@ class Chromium:
             if answer.get("id") == self._number:
                 check("error" not in answer, f"{method}: {answer.get('error')}")
                 return answer["result"]
+            if "method" in answer:
+                self.events.append(answer)
 
     def targets(self, kind):
         return [each for each in self.call("Target.getTargets")["targetInfos"] if each["type"] == kind]

@@ -64,15 +64,23 @@ std::int64_t Bag::version() const
     return _version;
 }
 
+std::uint64_t Bag::changes() const
+{
+    const platform::MutexLock lock(_mutex);
+    return _changes;
+}
+
 std::int64_t Bag::bump()
 {
     const platform::MutexLock lock(_mutex);
+    ++_changes;
     return ++_version;
 }
 
 std::expected<std::int64_t, std::string> Bag::bumpResources(const std::string& name)
 {
     const platform::MutexLock lock(_mutex);
+    ++_changes;
     if (!name.empty()) {
         const auto found = _resourceVersions.find(name);
         if (found == _resourceVersions.end())
@@ -105,12 +113,14 @@ std::expected<void, std::string> Bag::merge(const Value& keys)
         return std::unexpected(fmt::format("more than {} bytes of overrides: POST /control/reset", kMaximumOverrides));
     _overrides = std::move(merged);
     _version = version;
+    ++_changes;
     return {};
 }
 
 void Bag::reset()
 {
     const platform::MutexLock lock(_mutex);
+    ++_changes;
     _overrides = {};
 }
 

@@ -20,6 +20,8 @@ public:
 
     [[nodiscard]] platform::Value document() const;
     [[nodiscard]] std::int64_t version() const;
+    /// Returns a number that every change of the document increments.
+    [[nodiscard]] std::uint64_t changes() const;
 
     /// Raises the version by 1 and returns it.
     std::int64_t bump();
@@ -36,6 +38,7 @@ private:
     const std::string _base;
     mutable platform::Mutex _mutex;
     std::int64_t _version GUARDED_BY(_mutex) = 1;
+    std::uint64_t _changes GUARDED_BY(_mutex) = 0;
     std::map<std::string, std::int64_t, std::less<>> _resourceVersions GUARDED_BY(_mutex); ///< by name of the resource
     platform::Dictionary _overrides GUARDED_BY(_mutex);
 };

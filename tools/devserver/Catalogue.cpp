@@ -91,8 +91,8 @@ const Section* findSection(std::string_view key)
 Catalogue::Catalogue()
 {
     for (const auto& [name, table] : kCatalogueTables) {
-        const Section* section = findSection(name);
-        if (!section) throw std::runtime_error(fmt::format("catalogue: no section for {}.tsv", name));
+        const Section* section = findSection(name.substr(0, name.find('.')));
+        if (!section) throw std::runtime_error(fmt::format("catalogue: no section for {}", name));
         std::size_t line = 0;
         for (const std::string_view row : split(table, '\n')) {
             ++line;
@@ -100,7 +100,7 @@ Catalogue::Catalogue()
             try {
                 _entries.push_back(readRow(*section, row));
             } catch (const std::runtime_error& error) {
-                throw std::runtime_error(fmt::format("catalogue: {}.tsv:{}: {}", name, line, error.what()));
+                throw std::runtime_error(fmt::format("catalogue: {}:{}: {}", name, line, error.what()));
             }
         }
     }

@@ -1,6 +1,7 @@
 #include "tools/devserver/Control.h"
 
 #include <algorithm>
+#include <arpa/inet.h>
 #include <charconv>
 #include <optional>
 #include <vector>
@@ -8,9 +9,12 @@
 #include <fmt/format.h>
 #include <fmt/ranges.h>
 
+#include "CoreTavrin/TAVBag.h"
+#include "platform/net/HttpHeaders.h"
 #include "platform/values/Dictionary.h"
 #include "platform/values/Error.h"
 #include "platform/values/Json.h"
+#include "tools/devserver/EventStream.h"
 #include "tools/devserver/Service.h"
 
 namespace devserver {
@@ -96,6 +100,24 @@ Answer mergeBag(Service& service, const Value& body, const Request&)
     return merged ? jsonAnswer(service.bag.document()) : errorAnswer(400, merged.error());
 }
 
+Value problemsIn(const Value& bag)
+{
+    Value::Array problems;
+    for (std::string& problem : tavrin::TAVBag(bag, "").problems()) problems.push_back(std::move(problem));
+    return problems;
+}
+
+Answer showBag(Service& service, const Value&, const Request&)
+{
+    const Value document = service.bag.document();
+    return jsonAnswer(Value::dictionaryOf({{"bag", document}, {"problems", problemsIn(document)}}));
+}
+
+Answer checkBag(Service&, const Value& body, const Request&)
+{
+    return jsonAnswer(Value::dictionaryOf({{"problems", problemsIn(body)}}));
+}
+
 Answer bumpBag(Service& service, const Value&, const Request&)
 {
     return jsonAnswer(Value::dictionaryOf({{"version", service.bag.bump()}}));
@@ -136,18 +158,22 @@ Answer showLog(Service& service, const Value&, const Request& request)
 
 Answer showStatus(Service& service, const Value&, const Request&)
 {
-    return jsonAnswer(Value::dictionaryOf({{"bag_version", service.bag.version()},
-                                           {"requests", service.log.total()},
-                                           {"by_endpoint", service.log.byEndpoint()},
-                                           {"uploads", service.uploads.totals()},
-                                           {"faults", service.faults.count()},
-                                           {"max_age", service.maxAge.load()},
-                                           {"catalogue", service.catalogue.entries().size()}}));
+    return jsonAnswer(statusOf(service));
 }
 
-Answer showUploads(Service& service, const Value&, const Request&)
+Answer showUploads(Service& service, const Value&, const Request& request)
 {
-    return jsonAnswer(service.uploads.list());
+    const auto number = numberItem(request, "number", 0);
+    if (!number) return errorAnswer(400, "number is a whole number");
+    if (*number == 0)
+        return jsonAnswer(request.item("json") == "0" ? service.uploads.summaries() : service.uploads.list());
+    const Value upload = service.uploads.find(*number);
+    return upload.isNull() ? errorAnswer(404, "no such upload is kept") : jsonAnswer(upload);
+}
+
+Answer showEvents(Service& service, const Value&, const Request& request)
+{
+    return eventStream(service, request.connection);
 }
 
 struct Call {
@@ -164,11 +190,14 @@ const std::vector<Call>& calls()
         {"GET", "status", showStatus, {}},
         {"GET", "log", showLog, {}},
         {"GET", "uploads", showUploads, {}},
+        {"GET", "events", showEvents, {}},
         {"GET", "faults", listFaults, {}},
         {"POST", "faults", addFault, {"endpoint", "fault", "count"}},
         {"POST", "faults/clear", clearFaults, {}},
         {"POST", "release", release, {}},
+        {"GET", "bag", showBag, {}},
         {"POST", "bag", mergeBag, {}, true},
+        {"POST", "bag/check", checkBag, {}, true},
         {"POST", "bag/bump", bumpBag, {}},
         {"POST", "resources/bump", bumpResources, {"name"}},
         {"POST", "search", setSearch, {"max_age"}},
@@ -182,12 +211,42 @@ bool isLoopback(std::string_view address)
     return address.starts_with("127.") || address == "::1" || address.starts_with("::ffff:127.");
 }
 
+/// Returns whether a "Host" names this machine, with or without a port. A name that looks like an address is a name:
+/// "127.example" may resolve to anything.
+bool isThisMachine(std::string_view host)
+{
+    if (host.starts_with('[')) return host.substr(0, host.find(']') + 1) == "[::1]";
+    const std::string name(host.substr(0, host.find(':')));
+    in_addr address{};
+    return platform::equalIgnoringCase(name, "localhost") ||
+           (inet_pton(AF_INET, name.c_str(), &address) == 1 && isLoopback(name));
+}
+
+/// Returns whether a web page of another origin sent the request. Browsers set both fields, and pages can't.
+bool isForeign(const Request& request)
+{
+    const std::string* origin = findHeader(request.headers, "Origin");
+    const std::string* host = findHeader(request.headers, "Host");
+    if (origin && (!host || *origin != "http://" + *host)) return true;
+    const std::string* site = findHeader(request.headers, "Sec-Fetch-Site");
+    return site && *site != "same-origin" && *site != "none";
+}
+
 } // namespace
+
+std::optional<Answer> refusedAsStrange(const Request& request)
+{
+    if (request.secure) return errorAnswer(404, "this is served over HTTP, not over HTTPS");
+    if (!isLoopback(request.peer)) return errorAnswer(403, "this is for this machine only");
+    const std::string* host = findHeader(request.headers, "Host");
+    if (host && !isThisMachine(*host)) return errorAnswer(403, "give the host as localhost or 127.0.0.1");
+    return std::nullopt;
+}
 
 Answer controlAnswer(Service& service, const Request& request)
 {
-    if (request.secure) return errorAnswer(404, "control is served over HTTP, not over HTTPS");
-    if (!isLoopback(request.peer)) return errorAnswer(403, "control is for this machine only");
+    if (auto refused = refusedAsStrange(request)) return std::move(*refused);
+    if (isForeign(request)) return errorAnswer(403, "other web pages can't control this service");
     const std::string_view name = std::string_view(request.path).substr(std::min<std::size_t>(request.path.size(), 9));
     const auto call =
         std::ranges::find_if(calls(), [&](const Call& c) { return c.path == name && c.method == request.method; });

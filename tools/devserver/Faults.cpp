@@ -137,6 +137,16 @@ std::expected<std::vector<Fault>, std::string> parseFaults(std::string_view text
     return faults;
 }
 
+std::string textOf(const std::vector<Fault>& faults)
+{
+    std::vector<std::string> texts;
+    for (const Fault& fault : faults) {
+        const KindEntry& kind = *std::ranges::find(kKinds, fault.kind, &KindEntry::kind);
+        texts.push_back(kind.unit.empty() ? std::string(kind.name) : fmt::format("{}:{}", kind.name, fault.number));
+    }
+    return fmt::format("{}", fmt::join(texts, ","));
+}
+
 void spoil(Answer& answer, const Fault& fault, const Request& request)
 {
     switch (fault.kind) {

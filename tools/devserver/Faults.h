@@ -43,6 +43,9 @@ struct Fault {
 /// Parses a list like "delay:200,status:503". The error says what is allowed.
 [[nodiscard]] std::expected<std::vector<Fault>, std::string> parseFaults(std::string_view text);
 
+/// Returns the list as `parseFaults` reads it.
+[[nodiscard]] std::string textOf(const std::vector<Fault>& faults);
+
 /// Applies a fault to a finished answer. Delay, Hang and Endless change nothing here.
 void spoil(Answer& answer, const Fault& fault, const Request& request);
 

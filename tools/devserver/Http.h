@@ -40,8 +40,9 @@ struct Answer {
     Headers headers;
     std::size_t paddedTo = 0; ///< length to which the body is padded with blanks
     bool cut = false;         ///< the connection is closed in the middle of the body
-    /// If set, the body is sent without a length, followed by single blanks until this returns false.
-    std::function<bool()> goesOn{};
+    /// If set, the body is sent without a length. It continues with the texts that this returns, none of them empty,
+    /// and breaks off at nullopt. May block.
+    std::function<std::optional<std::string>()> more{};
 };
 
 [[nodiscard]] Answer jsonAnswer(const platform::Value& value, int status = 200);

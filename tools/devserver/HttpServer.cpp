@@ -66,25 +66,34 @@ struct Stream {
     Answer answer;
     std::size_t length = 0; // as announced; endless bodies have none
     std::size_t end = 0;
+    std::size_t sent = 0; // of the current text of an endless body
 
     /// Writes the bytes at `offset`, `size` at most, and returns their number; MHD_CONTENT_READER_END_WITH_ERROR ends
     /// the connection.
     ssize_t read(std::size_t offset, char* buffer, std::size_t size)
     {
+        if (answer.more) return readMore(buffer, size);
         const std::string& body = answer.body;
-        if (answer.goesOn && offset >= body.size()) {
-            if (!answer.goesOn()) return MHD_CONTENT_READER_END_WITH_ERROR;
-            *buffer = ' ';
-            return 1;
-        }
-        if (!answer.goesOn && offset >= end) return MHD_CONTENT_READER_END_WITH_ERROR; // less than was announced
+        if (offset >= end) return MHD_CONTENT_READER_END_WITH_ERROR; // less than was announced
         const bool inBody = offset < body.size();
-        const std::size_t limit = answer.goesOn ? body.size() : inBody ? std::min(body.size(), end) : end;
-        const std::size_t count = std::min(size, limit - offset);
+        const std::size_t count = std::min(size, (inBody ? std::min(body.size(), end) : end) - offset);
         if (inBody)
             std::memcpy(buffer, body.data() + offset, count);
         else
             std::memset(buffer, ' ', count);
+        return static_cast<ssize_t>(count);
+    }
+
+    ssize_t readMore(char* buffer, std::size_t size)
+    {
+        if (sent == answer.body.size()) {
+            auto next = answer.more();
+            if (!next) return MHD_CONTENT_READER_END_WITH_ERROR;
+            answer.body = std::move(*next);
+            sent = 0;
+        }
+        const std::size_t count = answer.body.copy(buffer, size, sent);
+        sent += count;
         return static_cast<ssize_t>(count);
     }
 };
@@ -96,7 +105,7 @@ Response streamed(Answer answer)
     auto stream = std::make_unique<Stream>();
     stream->length = std::max<std::size_t>({answer.body.size(), answer.paddedTo, 2});
     stream->end = answer.cut ? stream->length / 2 : stream->length;
-    const std::uint64_t size = answer.goesOn ? MHD_SIZE_UNKNOWN : stream->length;
+    const std::uint64_t size = answer.more ? MHD_SIZE_UNKNOWN : stream->length;
     stream->answer = std::move(answer);
     return {MHD_create_response_from_callback(
                 size, kPiece,
@@ -112,10 +121,10 @@ Response responseOf(Answer answer, const Request& request)
 {
     const Headers headers = answer.headers;
     const std::string type = answer.contentType;
-    const bool hasBody = !answer.body.empty() || answer.goesOn || answer.paddedTo > 0 || answer.cut;
+    const bool hasBody = !answer.body.empty() || answer.more || answer.paddedTo > 0 || answer.cut;
     bool packed = false;
     Response response(nullptr, MHD_destroy_response);
-    if (answer.goesOn || answer.cut || answer.paddedTo > answer.body.size()) {
+    if (answer.more || answer.cut || answer.paddedTo > answer.body.size()) {
         response = streamed(std::move(answer));
     } else {
         packed = answer.body.size() >= kPackedFrom && type == "application/json" &&

@@ -24,7 +24,7 @@ Value describeHeaders(const Headers& headers)
     return described;
 }
 
-void RequestLog::add(std::string_view endpoint, const Request& request)
+std::uint64_t RequestLog::add(std::string_view endpoint, const Request& request)
 {
     const auto now = std::chrono::system_clock::now();
     Value value = Value::dictionaryOf({{"number", 0},
@@ -34,13 +34,44 @@ void RequestLog::add(std::string_view endpoint, const Request& request)
                                        {"path", request.path},
                                        {"query", request.query},
                                        {"secure", request.secure},
-                                       {"headers", describeHeaders(request.headers)}});
+                                       {"headers", describeHeaders(request.headers)},
+                                       {"status", Value()},
+                                       {"size", Value()},
+                                       {"duration", Value()},
+                                       {"faults", Value()}});
     const platform::MutexLock lock(_mutex);
     ++_total;
     ++_counts[std::string(endpoint)];
     value.mutableDictionary().set("number", ++_lastNumber);
-    _kept.push_back({_lastNumber, std::string(endpoint), std::move(value)});
+    _kept.push_back({_lastNumber, ++_changes, std::string(endpoint), std::move(value)});
     if (_kept.size() > kKept) _kept.pop_front();
+    return _lastNumber;
+}
+
+void RequestLog::finish(std::uint64_t number, const Answer& answer, const std::string& faults,
+                        std::chrono::duration<double, std::milli> duration)
+{
+    const platform::MutexLock lock(_mutex);
+    if (_kept.empty() || number < _kept.front().number) return;
+    Kept& kept = _kept[number - _kept.front().number]; // numbers are consecutive
+    kept.changed = ++_changes;
+    platform::Dictionary& value = kept.value.mutableDictionary();
+    value.set("status", answer.status);
+    value.set("size", std::max(answer.body.size(), answer.paddedTo));
+    value.set("duration", duration.count());
+    value.set("faults", faults);
+}
+
+Value RequestLog::changesSince(std::uint64_t& mark) const
+{
+    const platform::MutexLock lock(_mutex);
+    if (mark == _changes) return {};
+    Value::Array requests;
+    for (const Kept& kept : _kept)
+        if (kept.changed > mark) requests.push_back(kept.value);
+    mark = _changes;
+    return Value::dictionaryOf(
+        {{"requests", std::move(requests)}, {"first", _kept.empty() ? _lastNumber + 1 : _kept.front().number}});
 }
 
 Value RequestLog::list(std::string_view endpoint, std::uint64_t since, std::size_t count) const
@@ -70,6 +101,7 @@ Value RequestLog::byEndpoint() const
 void RequestLog::clear()
 {
     const platform::MutexLock lock(_mutex);
+    ++_changes;
     _total = 0;
     _counts.clear();
     _kept.clear();

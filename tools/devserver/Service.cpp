@@ -6,6 +6,7 @@
 #include <fmt/format.h>
 
 #include "platform/net/Url.h"
+#include "tools/devserver/Console.h"
 #include "tools/devserver/Control.h"
 #include "tools/devserver/Images.h"
 #include "tools/devserver/Resources.h"
@@ -45,6 +46,11 @@ std::size_t numberIn(const Request& request, std::string_view name)
     return error == std::errc() ? number : 0;
 }
 
+bool isBelow(std::string_view path, std::string_view folder)
+{
+    return path.starts_with(folder) && (path.size() == folder.size() || path[folder.size()] == '/');
+}
+
 bool isSearch(std::string_view endpoint)
 {
     return endpoint == "search" || endpoint == "zkw" || endpoint == "more" || endpoint == "lookup" ||
@@ -75,11 +81,20 @@ Service::Service(const std::string& base_) : base(base_), bag(base_), _answers(c
 
 Answer Service::answer(const Request& request)
 {
-    if (request.path == "/control" || request.path.starts_with("/control/")) return controlAnswer(*this, request);
+    if (isBelow(request.path, "/control")) return controlAnswer(*this, request);
+    if (isBelow(request.path, "/console")) return consoleAnswer(request);
 
+    const auto begin = std::chrono::steady_clock::now();
     const std::string_view endpoint = endpointOf(request);
-    log.add(endpoint, request);
+    const std::uint64_t number = log.add(endpoint, request);
     const std::vector<Fault> wanted = faults.take(endpoint);
+    Answer answer = answerLogged(endpoint, request, wanted);
+    log.finish(number, answer, textOf(wanted), std::chrono::steady_clock::now() - begin);
+    return answer;
+}
+
+Answer Service::answerLogged(std::string_view endpoint, const Request& request, const std::vector<Fault>& wanted)
+{
     if (!holdBack(gate, wanted, request.connection)) return Answer{.status = 499, .cut = true}; // no peer reads it
 
     const bool isUpload = endpoint == "upload" && request.method == "POST";
@@ -88,8 +103,9 @@ Answer Service::answer(const Request& request)
     for (const Fault& fault : wanted) {
         spoil(answer, fault, request);
         if (fault.kind == Fault::Kind::Endless)
-            answer.goesOn = [this, connection = request.connection] {
-                return gate.wait(kPace, connection) == Gate::Outcome::TimeOver;
+            answer.more = [this, connection = request.connection]() -> std::optional<std::string> {
+                if (gate.wait(kPace, connection) != Gate::Outcome::TimeOver) return std::nullopt;
+                return " ";
             };
     }
     // These statuses have no body in HTTP: a client would read its bytes as the next answer on the connection.
@@ -107,7 +123,7 @@ Answer Service::answerEndpoint(std::string_view endpoint, const Request& request
     if (endpoint == "unknown")
         return errorAnswer(404,
                            "served here: /bag, /search, /more, /card, /flight, /images/ID, /resources/NAME, /warm, "
-                           "/feedback, /crowdsourcing; and /control over HTTP");
+                           "/feedback, /crowdsourcing; and /control and /console over HTTP");
     const bool get = request.method == "GET" || request.method == "HEAD";
     if (endpoint == "upload") return errorAnswer(405, "feedback must be sent with POST");
     if (!get) return errorAnswer(405, "only GET and HEAD are allowed");

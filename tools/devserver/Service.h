@@ -26,7 +26,11 @@ public:
     /// Serves a request. Blocks as long as its faults demand.
     [[nodiscard]] Answer answer(const Request& request);
     /// Ends all current and later delays.
-    void stop() { gate.close(); }
+    void stop()
+    {
+        gate.close();
+        streams.close();
+    }
 
     static constexpr std::uint64_t kDefaultMaxAge = 60;
 
@@ -38,11 +42,15 @@ public:
     RequestLog log;
     Uploads uploads;
     Gate gate;
+    Gate streams; ///< ends event streams; control calls don't release it
+    std::atomic<int> streamCount = 0;
     std::atomic<std::uint64_t> maxAge = kDefaultMaxAge; ///< seconds; "max_age" of result sets
     /// Called with a line about every upload. Set it before the first request.
     std::function<void(const std::string&)> onUpload;
 
 private:
+    [[nodiscard]] Answer answerLogged(std::string_view endpoint, const Request& request,
+                                      const std::vector<Fault>& wanted);
     [[nodiscard]] Answer answerEndpoint(std::string_view endpoint, const Request& request);
     [[nodiscard]] Answer answerSearch(std::string_view endpoint, const Request& request);
 

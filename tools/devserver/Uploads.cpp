@@ -1,5 +1,6 @@
 #include "tools/devserver/Uploads.h"
 
+#include <algorithm>
 #include <array>
 
 #include <fmt/format.h>
@@ -8,6 +9,7 @@
 #include "platform/values/Dictionary.h"
 #include "platform/values/Error.h"
 #include "platform/values/Json.h"
+#include "tools/devserver/SearchFigures.h"
 #include "tools/devserver/SessionShape.h"
 
 namespace devserver {
@@ -127,6 +129,7 @@ std::string Uploads::add(Upload upload, const Answer& answer)
                                                        {"cut", answer.cut},
                                                        {"agent", agent ? Value(*agent) : Value()},
                                                        {"events", events},
+                                                       {"searches", searchFigures(upload.json)},
                                                        {"error", upload.problem ? Value(*upload.problem) : Value()},
                                                        {"json", std::move(upload.json)}})});
     _keptBytes += upload.size;
@@ -143,6 +146,26 @@ Value Uploads::list() const
     Value::Array uploads;
     for (const Kept& kept : _kept) uploads.push_back(kept.value);
     return uploads;
+}
+
+Value Uploads::summaries() const
+{
+    Value::Array summaries;
+    const Value uploads = list();
+    for (const Value& upload : *uploads.asArray()) {
+        platform::Dictionary summary;
+        for (const auto& [key, value] : *upload.asDictionary())
+            if (key != "json") summary.set(key, value);
+        summaries.push_back(std::move(summary));
+    }
+    return summaries;
+}
+
+Value Uploads::find(std::uint64_t number) const
+{
+    const platform::MutexLock lock(_mutex);
+    const auto found = std::ranges::find_if(_kept, [&](const Kept& k) { return k.value["number"].asUInt() == number; });
+    return found == _kept.end() ? Value() : found->value;
 }
 
 Value Uploads::totals() const

@@ -44,9 +44,14 @@ public:
     /// Stores an upload with its answer; returns a line about both, for people.
     std::string add(Upload upload, const Answer& answer);
     /// Returns [{"number", "path", "query", "size", "packed_size", "digest", "digest_ok", "repeat", "status", "cut",
-    /// "agent", "events", "error", "json"}], oldest first. "repeat" is the number of earlier uploads with the same
-    /// digest, regardless of their answer. "status" and "cut" describe the answer after faults.
+    /// "agent", "events", "searches", "error", "json"}], oldest first. "repeat" is the number of earlier uploads with
+    /// the same digest, regardless of their answer. "status" and "cut" describe the answer after faults. "searches" has
+    /// the session's `searchFigures`.
     [[nodiscard]] platform::Value list() const;
+    /// Returns the list without "json".
+    [[nodiscard]] platform::Value summaries() const;
+    /// Returns the upload with that number; null if it isn't kept.
+    [[nodiscard]] platform::Value find(std::uint64_t number) const;
     /// Returns {"received", "taken", "refused", "repeats", "events"}: counts since the start or `clear`. An upload is
     /// taken if its answer was a complete 200. Its events are counted once for each digest.
     [[nodiscard]] platform::Value totals() const;

@@ -93,9 +93,9 @@ std::expected<void, std::string> run(const Options& options, const sigset_t& sig
         std::fflush(stdout);
         if (!options.quiet) {
             fmt::print(stderr,
-                       "tavrin-devserver: {} entries; the bag is at {}/bag\n"
+                       "tavrin-devserver: {} entries; the bag is at {}/bag, the console at http://{}:{}/console\n"
                        "  set SSL_CERT_FILE={} so that clients trust it; see docs/devserver.md\n",
-                       service.catalogue.entries().size(), base, certificate->certificate.string());
+                       service.catalogue.entries().size(), base, host, *httpPort, certificate->certificate.string());
             service.onUpload = printUpload;
         }
         http.start(handler); // after the line of JSON, which must be the first
