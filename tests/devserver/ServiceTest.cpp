@@ -166,10 +166,14 @@ TEST_F(ServiceTest, TheStreamDeliversWhatChanged)
     EXPECT_EQ(search[0]["endpoint"], Value("search"));
     EXPECT_EQ(search[0]["status"], Value(503));
     EXPECT_EQ(search[0]["faults"], Value("delay:0,status:503"));
+    const std::uint64_t held = service.log.add("search", request("GET", "/search?q=par"));
+    EXPECT_TRUE(next()["requests"][0]["status"].isNull());
+    service.log.finish(held, Answer(), "", std::chrono::seconds(1));
+    EXPECT_EQ(next()["requests"][0]["duration"].asDouble(), 1000) << "again, once it is answered";
     (void)service.answer(request("POST", "/control/bag", R"({"isEnabled": false})"));
     EXPECT_FALSE(next().asDictionary()->contains("requests"));
     (void)service.answer(request("POST", "/control/reset"));
-    EXPECT_EQ(next()["first"], Value(3)) << "the requests before are gone";
+    EXPECT_EQ(next()["first"], Value(4)) << "the requests before are gone";
     service.stop();
     EXPECT_EQ(stream.more(), std::nullopt);
 }
