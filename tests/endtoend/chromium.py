@@ -2,6 +2,7 @@
 import fcntl
 import json
 import os
+import shutil
 import subprocess
 
 from house import TIMEOUT, Failure, check
@@ -11,6 +12,7 @@ class Chromium:
     """Debian's Chromium, with an extension or without. Every host name but those of this machine is unknown to it."""
 
     def __init__(self, house, extension=None):
+        check(shutil.which("chromium"), "there is no chromium: run scripts/bootstrap check")
         self.profile = house.directory("chromium")
         self.events = []  # those of the domains that a case enables
         self._house, self._number, self._buffer = house, 0, b""
@@ -18,7 +20,8 @@ class Chromium:
         pipes = [os.pipe(), os.pipe()]  # commands, answers
         theirs = [fcntl.fcntl(pipes[0][0], fcntl.F_DUPFD, 10), fcntl.fcntl(pipes[1][1], fcntl.F_DUPFD, 10)]
         self._process = subprocess.Popen(
-            ["chromium", "--headless=new", "--no-sandbox", "--disable-gpu", "--no-first-run", "--remote-debugging-pipe",
+            ["chromium", "--headless=new", "--no-sandbox", "--disable-gpu", "--disable-dev-shm-usage",
+             "--no-first-run", "--remote-debugging-pipe",
              "--host-resolver-rules=MAP * ~NOTFOUND, EXCLUDE 127.0.0.1", f"--user-data-dir={self.profile}",
              *extensions, "about:blank"],
             env=dict(house.environment, HOME=self.profile), pass_fds=(3, 4), stdout=subprocess.DEVNULL,
