@@ -132,7 +132,7 @@ private:
     }
     std::string bagAdvice()
     {
-        const std::string check = "Check the URL: tavrinctl defaults read TAVBagURL.";
+        std::string check = "Check the URL: tavrinctl defaults read TAVBagURL.";
         switch (_status["bag"]["lastFetch"]["code"].asInt().value_or(0)) {
         case platform::kUrlTlsFailed: return "See \"certificates\".";
         case platform::kUrlCannotFindHost: return "See \"names\". " + check;

@@ -53,7 +53,7 @@ std::string explain(const Exchange& exchange)
     if (lacksBag(exchange))
         return fmt::format("the daemon has no bag{}; \"tavrinctl doctor\" says what to do",
                            exchange.cause.empty() ? "" : " (" + printable(exchange.cause) + ")");
-    const std::string reason = printable(error.reason().empty() ? error.description() : error.reason());
+    std::string reason = printable(error.reason().empty() ? error.description() : error.reason());
     if (error.domain == platform::kFormatErrorDomain) return "the service's answer is not JSON: " + reason;
     return reason;
 }
