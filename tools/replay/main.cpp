@@ -149,12 +149,7 @@ int main(int argc, char** argv)
     app.set_version_flag("--version", "tavrin-replay " TAVRIND_VERSION);
     tools::useReadableHelp(app);
     app.add_option("corpus", options.corpus, "Corpus file in the form of tools/replay/corpus.txt")->required();
-    app.add_option("--address", options.address, "The daemon's D-Bus address")
-        ->type_name("ADDRESS")
-        ->capture_default_str();
-    app.add_option("--identifier", options.identifier, "Client identifier to connect as")
-        ->type_name("NAME")
-        ->capture_default_str();
+    tools::addConnectionOptions(app, options.address, options.identifier);
     CLI::Option* speed =
         app.add_option("--speed", options.speed, "Factor on the speed of the users")->capture_default_str();
     tools::takesNumber(speed, "FACTOR", 0.01, 100000);

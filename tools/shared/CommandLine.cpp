@@ -148,6 +148,14 @@ void takesName(CLI::Option* option, const std::string& placeholder, std::vector<
             ""));
 }
 
+void addConnectionOptions(CLI::App& app, std::string& address, std::string& identifier)
+{
+    app.add_option("--address", address, "The daemon's D-Bus address")->type_name("ADDRESS")->capture_default_str();
+    app.add_option("--identifier", identifier, "Client identifier to connect as")
+        ->type_name("NAME")
+        ->capture_default_str();
+}
+
 void useReadableHelp(CLI::App& app)
 {
     const auto help = std::make_shared<ReadableHelp>();

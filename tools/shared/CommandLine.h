@@ -35,6 +35,9 @@ void takesWholeNumber(CLI::Option* option, const std::string& placeholder, doubl
 /// Accepts the names, which stand for numbers, and the numbers themselves.
 void takesName(CLI::Option* option, const std::string& placeholder, std::vector<std::pair<std::string, int>> names);
 
+/// Adds --address and --identifier: where the daemon is, and as which client the tool connects.
+void addConnectionOptions(CLI::App& app, std::string& address, std::string& identifier);
+
 /// Makes the help of `app` and of its commands readable: placeholders for values, defaults in brackets, and the options
 /// of `app` under "Global options" in the help of each command. Call it before commands are added.
 void useReadableHelp(CLI::App& app);

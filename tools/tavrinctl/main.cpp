@@ -49,12 +49,7 @@ int main(int argc, char** argv)
     app.fallthrough();
     app.require_subcommand(0, 1);
     app.add_flag("--json", options.json, "Print JSON");
-    app.add_option("--address", options.address, "The daemon's D-Bus address")
-        ->type_name("ADDRESS")
-        ->capture_default_str();
-    app.add_option("--identifier", options.identifier, "Client identifier to connect as")
-        ->type_name("NAME")
-        ->capture_default_str();
+    tools::addConnectionOptions(app, options.address, options.identifier);
     app.add_option("--agent", options.agent, "User agent, which selects this client's view of the bag")
         ->type_name("NAME/VERSION")
         ->capture_default_str();
