@@ -159,7 +159,8 @@ public:
     platform::Result<platform::Value> figures();
     platform::Result<platform::Value> waiting();
     platform::Result<platform::Value::Array> previewUploads();
-    /// Returns an error in `TAVErrorDomain` if the daemon would not send the request.
+    /// Returns the request that the daemon would send, with where each part comes from. Fails with an error in
+    /// `TAVErrorDomain` if it would send none.
     platform::Result<platform::Value> previewRequest(const TAVRequest& request);
     /// Returns after the daemon has closed this connection, which it does to start again without its traces.
     platform::Result<void> wipe(bool settings);

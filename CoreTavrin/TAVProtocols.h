@@ -68,7 +68,7 @@ public:
     virtual void waiting(platform::Reply<platform::Value> reply) = 0;
     /// Replies with what the next upload pass would send, a dictionary for each body: {"body" (bytes), "url",
     /// "headers", "events", "open"}. Has "bytes", the size, instead of a body that exceeds 8 MiB with those before it.
-    /// Changes nothing.
+    /// Changes nothing but a counter: a session file that is too large is counted again.
     virtual void previewUploads(platform::Reply<platform::Value::Array> reply) = 0;
     /// Replies with the HTTP request that the daemon would send for `request`, item by item: {"url", "items",
     /// "headers"}, each item and header with "name", "value" and "from". Sends nothing.

@@ -51,7 +51,7 @@ public:
                 remove(file->path());
         }
     }
-    /// Removes what the daemon wrote from a settings file, and the copy of a damaged one.
+    /// Removes the daemon's own settings from a settings file, and the copy that was kept of a damaged file.
     void removeDaemonSettings(const fs::path& path)
     {
         remove(path.string() + ".corrupt");

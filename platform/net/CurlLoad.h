@@ -33,8 +33,8 @@ public:
 
     /// Sets up the next hop on a new or reset handle. Returns false if it can't be sent; `finish` has the error.
     [[nodiscard]] bool prepare(CURL* easy);
-    /// Call this after a transfer has ended with `code`. Returns true if another hop follows: call `prepare` with
-    /// another handle.
+    /// Call this after a transfer has ended with `code`. Returns true if a redirect must be followed: then call
+    /// `prepare` again, with another handle.
     [[nodiscard]] bool goesOn(CURLcode code);
     /// Sets the time-out error. Call this at `deadline`.
     void timeOut(TimePoint now);

@@ -89,7 +89,7 @@ private:
     std::uint32_t _node = 0;
 };
 
-/// An array in an archive: what a field of type `std::vector<T>` holds.
+/// An array in an archive, where the record has a `std::vector<T>`.
 template <class T> class ArchivedArray {
 public:
     ArchivedArray() = default;

@@ -37,7 +37,7 @@ struct Program {
         flush->require_subcommand(1);
         flush->add_subcommand("watch", "Watch");
     }
-    /// What is wrong with the command line; empty if nothing is.
+    /// Returns what the tool prints about a wrong command line, or an empty text.
     std::string parse(const std::string& line)
     {
         try {

@@ -40,8 +40,8 @@ struct Answer {
     Headers headers;
     std::size_t paddedTo = 0; ///< length to which the body is padded with blanks
     bool cut = false;         ///< the connection is closed in the middle of the body
-    /// If set, the body is sent without a length. It continues with the texts that this returns, none of them empty,
-    /// and breaks off at nullopt. May block.
+    /// If set, the body has no length: it continues with the texts that this returns, which must not be empty. At
+    /// nullopt the connection is closed. May block.
     std::function<std::optional<std::string>()> more{};
 };
 

@@ -158,7 +158,7 @@ std::vector<std::string> profileProblemsIn(const platform::Directories& director
     std::vector<std::string> problems;
     const auto bytes =
         platform::makeSystemFiles()->read(directories.config / kServiceName / "device.json", kLargestStore);
-    // A file that can't be parsed is a problem of the stores.
+    // The check of the stores reports a file that can't be parsed.
     if (const auto profile = bytes ? platform::parseJson(bytes->view()).value_or(Value()) : Value(); !profile.isNull())
         (void)platform::deviceProfileFromValue(profile, problems);
     return problems;
