@@ -10,8 +10,7 @@
 
 #include "platform/device/MemoryPressure.h"
 #include "platform/run/NotificationCenter.h"
-#include "tavrind/CachedResultSet.h"
-#include "tavrind/CritbitTree.h"
+#include "tavrind/CachedResultSets.h"
 
 namespace platform {
 class Queue;
@@ -61,18 +60,14 @@ public:
 
 private:
     void _cacheClearNotification();
-    [[nodiscard]] static bool _isKept(const CachedResultSet& set);
     void _store(std::shared_ptr<const CachedResultSet> set);
-    void _clearCache();
     void _startListeningForMemoryPressure();
 
     Assembly& _assembly;
     std::atomic<std::uint64_t> _generation = 0;
     std::vector<platform::NotificationCenter::Token> _observers;
     std::shared_ptr<platform::Queue> _queue; // guards all below
-    CritbitTree<const CachedResultSet> _tree;
-    std::vector<std::shared_ptr<const CachedResultSet>> _stored; // owns the tree's sets, and replaced ones
-    std::size_t _currentCost = 0;
+    CachedResultSets _sets;
     std::unique_ptr<platform::MemoryPressure::Watch> _source;
 };
 
