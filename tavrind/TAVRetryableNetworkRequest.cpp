@@ -5,7 +5,14 @@
 
 namespace tavrin {
 namespace {
-constexpr std::chrono::milliseconds kDelayOnFail{1500};
+constexpr platform::Duration kDelayOnFail = std::chrono::milliseconds(1500);
+}
+
+std::optional<platform::Duration> delayBeforeRetry(std::optional<platform::Date> expire, bool delayOnFail,
+                                                   unsigned retriesLeft, platform::Date now)
+{
+    if (now > expire.value_or(platform::Date()) || retriesLeft == 0) return std::nullopt;
+    return delayOnFail ? kDelayOnFail : platform::Duration::zero();
 }
 
 std::shared_ptr<platform::UrlTask> dataTaskWithRetryableRequest(platform::Device& device,
@@ -21,15 +28,15 @@ std::shared_ptr<platform::UrlTask> dataTaskWithRetryableRequest(platform::Device
                       completion = std::move(completion)](auto data, auto response, auto error) mutable {
             const auto finished = cell->lock();
             const platform::Value timingData = finished ? finished->timingData() : platform::Value();
-            const platform::Date deadline = request.expire.value_or(platform::Date());
-            if (!error || device.clock.wallNow() > deadline || retriesLeft == 0)
-                return completion(std::move(data), std::move(response), std::move(error), timingData);
+            const auto delay =
+                error ? delayBeforeRetry(request.expire, request.delayOnFail, retriesLeft, device.clock.wallNow())
+                      : std::nullopt;
+            if (!delay) return completion(std::move(data), std::move(response), std::move(error), timingData);
 
             if (request.failed) request.failed(*error);
-            const platform::Duration delay = request.delayOnFail ? kDelayOnFail : platform::Duration::zero();
             device.globalQueue(platform::Priority::High)
-                ->after(delay, [&device, session, request = std::move(request), attempt, retriesLeft,
-                                completion = std::move(completion)]() mutable {
+                ->after(*delay, [&device, session, request = std::move(request), attempt, retriesLeft,
+                                 completion = std::move(completion)]() mutable {
                     dataTaskWithRetryableRequest(device, session, std::move(request), attempt + 1, retriesLeft - 1,
                                                  std::move(completion))
                         ->resume();

@@ -23,6 +23,11 @@ struct TAVRetryableNetworkRequest {
     std::function<void(const platform::Error&)> failed = {};
 };
 
+/// Returns the delay before a failed request is repeated; nothing if the failure is final. The first two parameters are
+/// those of `TAVRetryableNetworkRequest`.
+[[nodiscard]] std::optional<platform::Duration> delayBeforeRetry(std::optional<platform::Date> expire, bool delayOnFail,
+                                                                 unsigned retriesLeft, platform::Date now);
+
 /// Called once, for the last attempt, on the session's delegate queue, with that attempt's timing data.
 using RetryCompletion =
     std::move_only_function<void(std::optional<platform::Bytes> data, std::optional<platform::UrlResponse> response,
