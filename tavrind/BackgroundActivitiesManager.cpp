@@ -35,17 +35,6 @@ constexpr std::size_t kMaximumPreview = 8u << 20; // bytes of compressed bodies 
 /// Age at which the file of a body counts as abandoned: no body takes that long to write.
 constexpr std::chrono::hours kOldBody(1);
 
-platform::ActivityCriteria criteria()
-{
-    platform::ActivityCriteria criteria = TavrinXPCCriteria::createCriteria();
-    TavrinXPCCriteria::setDelay(kEarliestStart, criteria);
-    TavrinXPCCriteria::setInterval(kInterval, criteria);
-    TavrinXPCCriteria::setGracePeriod(kGracePeriod, criteria);
-    TavrinXPCCriteria::setRepeating(true, criteria);
-    TavrinXPCCriteria::setAllowBatteryUsage(true, criteria);
-    return criteria;
-}
-
 /// Sets the activity's state, and logs a refusal.
 void setState(ActivityState state, platform::Activity& activity)
 {
@@ -56,6 +45,17 @@ void setState(ActivityState state, platform::Activity& activity)
 }
 
 } // namespace
+
+platform::ActivityCriteria BackgroundActivitiesManager::criteria()
+{
+    platform::ActivityCriteria criteria = TavrinXPCCriteria::createCriteria();
+    TavrinXPCCriteria::setDelay(kEarliestStart, criteria);
+    TavrinXPCCriteria::setInterval(kInterval, criteria);
+    TavrinXPCCriteria::setGracePeriod(kGracePeriod, criteria);
+    TavrinXPCCriteria::setRepeating(true, criteria);
+    TavrinXPCCriteria::setAllowBatteryUsage(true, criteria);
+    return criteria;
+}
 
 std::shared_ptr<BackgroundActivitiesManager> BackgroundActivitiesManager::make(Assembly& assembly)
 {

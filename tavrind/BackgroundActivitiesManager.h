@@ -13,6 +13,7 @@
 
 namespace platform {
 class Activity;
+struct ActivityCriteria;
 class Queue;
 } // namespace platform
 
@@ -33,6 +34,9 @@ public:
     static std::shared_ptr<BackgroundActivitiesManager> make(Assembly& assembly);
     explicit BackgroundActivitiesManager(Assembly& assembly);
     ~BackgroundActivitiesManager() override;
+
+    /// Returns when the background activity runs.
+    [[nodiscard]] static platform::ActivityCriteria criteria();
 
     /// Runs one pass, asynchronously, then calls back.
     void insertFlushActivity(std::move_only_function<void()> callback);

@@ -27,14 +27,6 @@ namespace tavrin {
 
 using namespace std::chrono_literals;
 
-namespace {
-
-constexpr platform::Duration kSoftLimit = 10min;
-constexpr platform::Duration kFromSoftLimitToMaxTime = 5min;
-constexpr std::chrono::seconds kIdleTime = 180s;
-
-} // namespace
-
 /// The arguments of an event of the state machine.
 struct ClientSessionManager::Occasion {
     std::shared_ptr<TavrinFeedback> feedback{};
@@ -113,7 +105,7 @@ void ClientSessionManager::_takeFeedback(std::shared_ptr<TavrinFeedback> feedbac
     else if (_currentState == SoftLimit && _expirationTime <= now)
         event = SessionEvent::Idle;
     _updateState(event, {.feedback = std::move(feedback), .call = std::move(call)});
-    _expirationTime = now + kIdleTime;
+    _expirationTime = now + kSessionIdleTime;
 }
 
 void ClientSessionManager::_updateState(SessionEvent event, Occasion occasion)
@@ -174,7 +166,7 @@ void ClientSessionManager::_endIdleAndBegin(Occasion& occasion)
 {
     _flushSessionWithReason(SessionEndReason::SessionIdle, [this] {
         log(kLogSession)
-            .log("session flushed because soft limit reached and idle time was beyond {} {}", kIdleTime.count(),
+            .log("session flushed because soft limit reached and idle time was beyond {} {}", kSessionIdleTime.count(),
                  _identifier);
     });
     _guidController->reset();
@@ -210,7 +202,7 @@ void ClientSessionManager::_setNewSession(Occasion& occasion)
                                                    std::move(occasion.call));
     log(kLogSession).log("new session id {} {}", counter, _identifier);
 
-    _sessionQueue->after(kSoftLimit, [weak = weak_from_this(), counter] {
+    _sessionQueue->after(kSessionSoftLimit, [weak = weak_from_this(), counter] {
         const auto self = weak.lock();
         if (!self) return;
         log(kLogSession)

@@ -26,6 +26,12 @@ enum class SessionState : unsigned {
     None,      ///< no session exists
 };
 
+/// From the beginning of a session to its soft limit, and from there to its end.
+inline constexpr platform::Duration kSessionSoftLimit = std::chrono::minutes(10);
+inline constexpr platform::Duration kFromSoftLimitToMaxTime = std::chrono::minutes(5);
+/// How long after its last event a session at its soft limit counts as idle.
+inline constexpr std::chrono::seconds kSessionIdleTime{180};
+
 /// An event that may change a session's state. The numbers are fixed; 4 is unused.
 enum class SessionEvent : unsigned {
     AddFeedback = 0,

@@ -36,6 +36,11 @@ std::optional<std::string> shortName(const std::string& identifier)
 
 } // namespace
 
+bool needsWarming(std::optional<platform::Date> lastRequest, platform::Date now)
+{
+    return !lastRequest || now - *lastRequest >= kConnectionStaysWarm;
+}
+
 ClientState::ClientState(std::string identifier, Assembly& assembly)
     : _assembly(assembly), _identifier(std::move(identifier)), _clientShortName(shortName(_identifier)),
       _queue(assembly.device.serialQueue("com.quorvane.tavrind.clientState", rank::kStore)),
@@ -157,8 +162,7 @@ void ClientState::warm()
     const auto url = _assembly.bagController->warmURL();
     if (!url) return log(kLogSearch).log("warm not required, bag fetch in process");
     const platform::Date now = _assembly.device.clock.wallNow();
-    const auto last = _queue->sync([this] { return _lastNetworkRequest; });
-    if (last && now - *last < kConnectionStaysWarm)
+    if (!needsWarming(_queue->sync([this] { return _lastNetworkRequest; }), now))
         return log(kLogSearch).log("warm not required, connection still warm");
 
     const platform::UrlRequest request = _assembly.requestFactory->warmRequest(*url);

@@ -19,6 +19,9 @@ class ClientSessionManager;
 class QueryCache;
 class TavrinUserGUIDController;
 
+/// Returns whether the connection to the service must be opened again before a search: nothing was sent for 30 s.
+[[nodiscard]] bool needsWarming(std::optional<platform::Date> lastRequest, platform::Date now);
+
 /// A snapshot of a client's state for its requests.
 struct ClientView {
     std::shared_ptr<const TAVBag> bag;                            ///< null before the first one

@@ -29,7 +29,6 @@ constexpr const char* kTableKey = "download_resources";
 constexpr const char* kIdentifierHeader = "X-Quorvane-Download-Identifier";
 constexpr const char* kDirectory = "com.quorvane.tavrind";
 constexpr const char* kDelayKey = "TAVDownloadDelay"; // for development
-constexpr std::int64_t kDefaultDelay = 60;            // seconds
 constexpr std::int64_t kLongestDelay = 24 * 60 * 60;
 /// Time limit for the list of downloads that a bag cancels.
 constexpr std::chrono::seconds kLongestWait(60);
@@ -283,8 +282,8 @@ std::string DownloadManager::_resourceVersion(const DownloadResource& resource) 
 
 platform::Duration DownloadManager::_delay() const
 {
-    const std::int64_t seconds = _assembly.userDefaults.integer(kDelayKey).value_or(kDefaultDelay);
-    return std::chrono::seconds(seconds >= 0 && seconds <= kLongestDelay ? seconds : kDefaultDelay);
+    const std::int64_t seconds = _assembly.userDefaults.integer(kDelayKey).value_or(kDownloadDelay.count());
+    return std::chrono::seconds(seconds >= 0 && seconds <= kLongestDelay ? seconds : kDownloadDelay.count());
 }
 
 bool DownloadManager::_isAllowed(const std::string& identifier) const

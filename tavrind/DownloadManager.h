@@ -1,5 +1,6 @@
 #pragma once
 
+#include <chrono>
 #include <cstdint>
 #include <filesystem>
 #include <map>
@@ -30,6 +31,9 @@ class TAVBag;
 inline constexpr const char* TAVFileDownloadCompletedNotification = "TAVFileDownloadCompletedNotification";
 /// Posted after a resource was deleted, or is to be fetched again because the location changed, with "identifier".
 inline constexpr const char* TAVFileDeletedNotification = "TAVFileDeletedNotification";
+
+/// From a new bag to the download of the resources that it changes.
+inline constexpr std::chrono::seconds kDownloadDelay{60};
 
 /// What the download manager needs to know about lookup hints. Implemented by the service that installs them. Any
 /// thread.

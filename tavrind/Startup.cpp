@@ -52,6 +52,24 @@ platform::UrlSessionConfiguration foregroundConfiguration(const Assembly& assemb
 
 } // namespace
 
+platform::BackgroundSessionConfiguration downloadConfiguration(std::string caFile)
+{
+    return {.identifier = "com.quorvane.tavrind",
+            .allowsMetered = false,
+            .resourceTimeout = 24h,
+            .caFile = std::move(caFile),
+            .rank = rank::kContext};
+}
+
+platform::BackgroundSessionConfiguration uploadConfiguration(std::string caFile)
+{
+    return {.identifier = "com.quorvane.tavrind.flusher.nsurlsession",
+            .requestTimeout = 300s,
+            .resourceTimeout = std::chrono::days(7),
+            .caFile = std::move(caFile),
+            .rank = rank::kContext};
+}
+
 Daemon::Daemon(platform::Device& device) : assembly(device) {}
 Daemon::~Daemon() = default;
 
@@ -76,24 +94,16 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device, Star
     assembly.persistentStorage = TavrinPersistentStorage::make(assembly);
     assembly.crowdsourcingFeedbackFlusher = TavrinFeedbackFlusher::make(assembly, FlusherIdentity::Crowdsourcing);
     assembly.backgroundFlusher = BackgroundActivitiesManager::make(assembly);
-    assembly.downloadURLSession = device.backgroundSessions.make(
-        {.identifier = "com.quorvane.tavrind",
-         .allowsMetered = false,
-         .resourceTimeout = 24h,
-         .caFile = assembly.caFile,
-         .rank = rank::kContext},
-        assembly.downloadManager, device.serialQueue("com.quorvane.tavrind.downloadSession", rank::kRoot));
+    assembly.downloadURLSession =
+        device.backgroundSessions.make(downloadConfiguration(assembly.caFile), assembly.downloadManager,
+                                       device.serialQueue("com.quorvane.tavrind.downloadSession", rank::kRoot));
     assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.launch");
     assembly.bagSession = device.urlLoader.makeSession(
         {.meteredPurgeTimeout = 10s, .network = &device.network, .caFile = assembly.caFile},
         sessionQueue("com.quorvane.tavrind.bagSession"));
-    assembly.uploadURLSession = device.backgroundSessions.make(
-        {.identifier = "com.quorvane.tavrind.flusher.nsurlsession",
-         .requestTimeout = 300s,
-         .resourceTimeout = std::chrono::days(7),
-         .caFile = assembly.caFile,
-         .rank = rank::kContext},
-        assembly.backgroundFlusher, device.serialQueue("com.quorvane.tavrind.uploadSession", rank::kRoot));
+    assembly.uploadURLSession =
+        device.backgroundSessions.make(uploadConfiguration(assembly.caFile), assembly.backgroundFlusher,
+                                       device.serialQueue("com.quorvane.tavrind.uploadSession", rank::kRoot));
     assembly.backgroundFlusher->findUploads();
     assembly.lookup = Lookup::make(assembly);
     assembly.bagController = TavrinBagController::make(assembly);

@@ -1,7 +1,9 @@
 #pragma once
 
 #include <memory>
+#include <string>
 
+#include "platform/net/BackgroundSession.h"
 #include "platform/values/Error.h"
 #include "tavrind/Assembly.h"
 #include "tavrind/Restart.h"
@@ -28,6 +30,10 @@ struct Daemon {
     std::shared_ptr<TavrinService> service;
     std::unique_ptr<platform::ipc::Listener> listener;
 };
+
+/// The configurations of the background sessions. `caFile` as in `Assembly`.
+[[nodiscard]] platform::BackgroundSessionConfiguration downloadConfiguration(std::string caFile);
+[[nodiscard]] platform::BackgroundSessionConfiguration uploadConfiguration(std::string caFile);
 
 /// Creates the services in their fixed order, then starts to listen. Fails only if the service's socket is not
 /// available, for example because another daemon serves it. The device must outlive the daemon.

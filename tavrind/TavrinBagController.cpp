@@ -64,6 +64,11 @@ BagStaleness bagStaleness(std::optional<double> expiration, const std::string* c
     return *cachedUrl == currentUrl() ? BagStaleness::Fresh : BagStaleness::UrlChanged;
 }
 
+double bagExpiration(platform::Date fetched)
+{
+    return platform::secondsSince1970(fetched) + kTrustedForSeconds;
+}
+
 bool versionPrecedes(std::string_view a, std::string_view b)
 {
     const auto isDigit = [](char c) { return c >= '0' && c <= '9'; };
@@ -273,7 +278,7 @@ Value TavrinBagController::_dictionaryToCacheBag(const Value& fetched)
 {
     Value bag = fetched;
     platform::Dictionary& entries = bag.mutableDictionary();
-    entries.set(kExpirationKey, platform::secondsSince1970(_assembly.device.clock.wallNow()) + kTrustedForSeconds);
+    entries.set(kExpirationKey, bagExpiration(_assembly.device.clock.wallNow()));
     entries.set(kBagUrlKey, _bagCacheURL());
     return bag;
 }

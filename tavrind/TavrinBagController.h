@@ -43,6 +43,9 @@ enum class BagStaleness { Fresh, Expired, NoUrl, UrlChanged };
 [[nodiscard]] BagStaleness bagStaleness(std::optional<double> expiration, const std::string* cachedUrl,
                                         platform::Date now, const std::function<std::string()>& currentUrl);
 
+/// Returns until when a bag that was fetched at `fetched` is trusted, in seconds since 1970.
+[[nodiscard]] double bagExpiration(platform::Date fetched);
+
 /// Returns whether version `a` precedes `b`. Runs of digits compare as numbers: "9" precedes "10".
 [[nodiscard]] bool versionPrecedes(std::string_view a, std::string_view b);
 
