@@ -70,6 +70,7 @@ class House:
         self.daemon, self.daemon_options = None, ["--check-queues"]
         self.passed_on = "XDG_|SSL_|TMPDIR|.*SAN_OPTIONS"  # the daemon's part of the environment
         self.filtered = False  # True: a system call that the daemon's unit refuses ends it
+        self.wrapper = []  # the words of a command that runs the daemon
         self.others = []  # processes that a case starts, and that end with the house
         self.service = subprocess.Popen([DEVSERVER, "--http-port", "0", "--https-port", "0", "--cert-dir",
                                          self.home / "certificate", "--quiet"], stdout=subprocess.PIPE,
@@ -93,7 +94,7 @@ class House:
         """Holds the socket, as systemd's socket units do; the daemon starts with its first client."""
         self.socket().parent.mkdir(mode=0o700, exist_ok=True)
         passed_on = [f"-E{name}" for name in self.environment if re.match(self.passed_on, name)]
-        program = [FILTERED, TAVRIND] if self.filtered else [TAVRIND]
+        program = [*self.wrapper, FILTERED, TAVRIND] if self.filtered else [*self.wrapper, TAVRIND]
         self.daemon = subprocess.Popen(["systemd-socket-activate", f"--listen={self.socket()}", *passed_on,
                                         *program, "--log-level", log_level, *self.daemon_options],
                                        env=self.environment, stderr=subprocess.PIPE)
@@ -165,9 +166,9 @@ class House:
 
     # ---- Waiting
 
-    def soon(self, holds, what):
+    def soon(self, holds, what, timeout=TIMEOUT):
         """Waits until `holds()`, which is called ten times a second: there is no event for what other processes do."""
-        end = time.monotonic() + TIMEOUT
+        end = time.monotonic() + timeout
         while not (result := holds()):
             check(time.monotonic() < end, what() if callable(what) else what)
             time.sleep(0.1)
