@@ -51,8 +51,6 @@ private:
     void begin(const std::shared_ptr<CurlTask>& task);
     void send(const std::shared_ptr<CurlTask>& task);
     void end(CURL* easy, CURLcode code, bool cancelled);
-    [[nodiscard]] CURL* takeEasy();
-    void giveBack(CURL* easy);
     void act(curl_socket_t socket, int events);
     void settle();
     void relieve();
@@ -69,7 +67,6 @@ private:
     std::optional<TimePoint> _curlDue;          // when libcurl wants to be called
     std::optional<TimePoint> _timerDue;         // when the timer fires
     std::map<CURL*, std::shared_ptr<CurlTask>> _active;
-    std::vector<CURL*> _spare;
     bool _stopped = false;
 };
 
@@ -203,31 +200,12 @@ void Loader::stop()
     _queue->async([&] {
         _stopped = true;
         while (!_active.empty()) end(_active.begin()->first, CURLE_OK, true);
-        for (CURL* easy : _spare) curl_easy_cleanup(easy);
         curl_multi_cleanup(_multi); // ends the watch of each socket
         _timer.reset();
         stopped.set_value();
     });
     WorkerPool::shareKeptJobs();
     stopped.get_future().wait();
-}
-
-CURL* Loader::takeEasy()
-{
-    if (_spare.empty()) return curl_easy_init();
-    CURL* easy = _spare.back();
-    _spare.pop_back();
-    return easy;
-}
-
-void Loader::giveBack(CURL* easy)
-{
-    constexpr std::size_t kSpareHandles = 8;
-    curl_easy_reset(easy); // it refers to the load
-    // A transfer that ended before others on its connection keeps its buffer, whose size is fixed.
-    const bool isClean = curl_easy_setopt(easy, CURLOPT_BUFFERSIZE, static_cast<long>(CURL_MAX_WRITE_SIZE)) == CURLE_OK;
-    if (!isClean || _spare.size() == kSpareHandles) return curl_easy_cleanup(easy);
-    _spare.push_back(easy);
 }
 
 void Loader::begin(const std::shared_ptr<CurlTask>& task)
@@ -237,16 +215,17 @@ void Loader::begin(const std::shared_ptr<CurlTask>& task)
     send(task);
 }
 
-/// Sends a hop of the task's load.
+/// Sends a hop of the task's load. Each has a handle of its own: if a response begins with a folded line, libcurl 7.88
+/// appends it to the last header field of the handle's transfer before, whose memory it has freed.
 void Loader::send(const std::shared_ptr<CurlTask>& task)
 {
-    CURL* easy = takeEasy();
+    CURL* easy = curl_easy_init();
     if (easy && task->load->prepare(easy) && curl_multi_add_handle(_multi, easy) == CURLM_OK) {
         _active.emplace(easy, task);
         return;
     }
     task->complete(CURLE_FAILED_INIT);
-    if (easy) giveBack(easy);
+    if (easy) curl_easy_cleanup(easy);
 }
 
 void Loader::end(CURL* easy, CURLcode code, bool cancelled)
@@ -263,7 +242,7 @@ void Loader::end(CURL* easy, CURLcode code, bool cancelled)
         send(task);
     else
         task->complete(code);
-    giveBack(easy);
+    curl_easy_cleanup(easy);
 }
 
 /// While all bodies together take too much memory, fails the largest: ordinary responses are not the cause.
