@@ -267,12 +267,16 @@ std::size_t CurlLoad::receivedHeader(std::string_view line)
         return line.size();
     }
     const std::size_t colon = line.find(':');
-    if (colon == std::string_view::npos) return line.size();
-    std::string_view value = line.substr(colon + 1);
     const auto isBlank = [](char c) { return c == ' ' || c == '\t' || c == '\r' || c == '\n'; };
-    while (!value.empty() && isBlank(value.front())) value.remove_prefix(1);
-    while (!value.empty() && isBlank(value.back())) value.remove_suffix(1);
-    _headers.add(std::string(line.substr(0, colon)), std::string(value));
+    // A line without a name continues another field or is none.
+    if (colon == 0 || colon == std::string_view::npos || std::ranges::any_of(line.substr(0, colon), isBlank))
+        return line.size();
+    std::string_view text = line.substr(colon + 1);
+    while (!text.empty() && isBlank(text.front())) text.remove_prefix(1);
+    while (!text.empty() && isBlank(text.back())) text.remove_suffix(1);
+    std::string value(text);
+    std::ranges::replace(value, '\r', ' '); // RFC 9110, 5.5
+    _headers.add(std::string(line.substr(0, colon)), std::move(value));
     return line.size();
 }
 
