@@ -369,7 +369,7 @@ bool CurlLoad::goesOn(CURLcode code)
         _fresh = true;
         return true;
     }
-    if (_error || (code != CURLE_OK && !(hasUpload() && isFinal()))) return false;
+    if (_error || !isFinal() || (code != CURLE_OK && !hasUpload())) return false;
     const UrlSource source{.secure = _hop.url.scheme() == "https" || (_hop.source && _hop.source->secure),
                            .isPublic = _publicPeer || (_hop.source && _hop.source->isPublic)};
     auto next = redirected(_hop, hasUpload() || !_hop.body.empty(), response(), source);
@@ -401,6 +401,7 @@ std::optional<Error> CurlLoad::errorOf(CURLcode code) const
     if (code == CURLE_UNSUPPORTED_PROTOCOL && _sent)
         return urlError(kUrlBadResponse, fmt::format("the response isn't HTTP: {}", _errorText.data()));
     if (code != CURLE_OK) return urlErrorFromCurl(code, _errorText.data());
+    if (!isFinal()) return urlError(kUrlBadResponse, "the response has no complete head with a final status");
     if (!_decoder.finished()) return urlError(kUrlBadResponse, "the body ends before its content coding does");
     return std::nullopt;
 }
