@@ -9,8 +9,17 @@
 #include <string>
 #include <string_view>
 
+#include "platform/base/Log.h"
+
 /// What a fuzz target does with an input. Each target is one source, which defines it.
 void runInput(std::string_view input);
+
+/// Keeps the log quiet: writing it would take most of the time.
+extern "C" int LLVMFuzzerInitialize(int*, char***)
+{
+    platform::Log::threshold = platform::LogLevel::Fault;
+    return 0;
+}
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
 {

@@ -1,6 +1,5 @@
 #include "CoreTavrin/TAVRequest.h"
 #include "fuzz/Check.h"
-#include "platform/base/Log.h"
 #include "platform/values/Json.h"
 #include "tavrind/Lookup.h"
 
@@ -8,7 +7,6 @@
 /// order, and changes nothing else; once filtered it stays as it is.
 void runInput(std::string_view input)
 {
-    platform::Log::threshold = platform::LogLevel::Fault;
     tavrin::TAVLookupRequest request;
     request.queryContext = std::string(takeLine(input));
     auto response = platform::parseJson(input);

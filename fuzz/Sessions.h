@@ -1,6 +1,7 @@
 #pragma once
 
 #include "fuzz/Check.h"
+#include "fuzz/UploadModel.h"
 #include "platform/values/Error.h"
 #include "platform/values/Json.h"
 #include "platform/values/Value.h"
@@ -10,15 +11,18 @@
 
 namespace fuzz {
 
-/// Checks what would be uploaded of a session: JSON text with every event, and at the end what they refer to.
+/// Checks what would be uploaded of a session: JSON text with every event, and at the end what they refer to, exactly
+/// as the model has it.
 inline void checkUpload(tavrin::StoredSession& session)
 {
     constexpr std::size_t kKindsOfMissing = 2; // results and suggestions
     const std::size_t events = session.recordedEvents();
+    const std::string expected = UploadModel::upload(session.feedbacks(), session.description());
     tavrin::MemoryOutputStream stream;
     stream.open();
     const auto keys = session.getFeedbacksToSend(stream);
     check(keys.has_value());
+    check(stream.contents() == expected, std::string(stream.contents()) + "\n" + expected);
 
     const auto json = platform::parseJson(stream.contents());
     if (!json) return check(json.error().reason().starts_with("nested deeper"), json.error().description());
