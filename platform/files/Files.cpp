@@ -202,10 +202,15 @@ public:
 
     Result<void> createDirectories(const fs::path& path) override
     {
-        if (mkdir(path.c_str(), 0700) == 0) return {};
-        if (errno == ENOENT && path.has_relative_path()) {
+        int made = mkdir(path.c_str(), 0700);
+        if (made != 0 && errno == ENOENT && path.has_relative_path()) {
             if (auto parent = createDirectories(path.parent_path()); !parent) return parent;
-            if (mkdir(path.c_str(), 0700) == 0) return {};
+            made = mkdir(path.c_str(), 0700);
+        }
+        if (made == 0) {
+            // Files in it are durable only if it is. A parent of others may not be readable.
+            if (const FileHandle parent = openDirectory(path.parent_path())) synchronized(parent.fd());
+            return {};
         }
         if (errno != EEXIST) return failure(path);
         struct stat status{};

@@ -67,7 +67,7 @@ public:
     [[nodiscard]] virtual Result<FileHandle> create(const std::filesystem::path& path) = 0;
     /// Makes the file's contents and name durable: returns after they would survive a power cut.
     [[nodiscard]] virtual Result<void> sync(const std::filesystem::path& path) = 0;
-    /// Creates the directory and its missing parents, mode 0700. Succeeds if it exists.
+    /// Creates the directory and its missing parents, mode 0700, and makes them durable. Succeeds if it exists.
     [[nodiscard]] virtual Result<void> createDirectories(const std::filesystem::path& path) = 0;
     [[nodiscard]] virtual Result<FileInfo> info(const std::filesystem::path& path) = 0;
     /// Removes a file. Fails with ENOENT if it is missing.
