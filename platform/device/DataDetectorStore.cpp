@@ -20,8 +20,11 @@ public:
 
     Result<void> setSource(int kind, const FileHandle* file, const std::string& signature) override
     {
-        if (auto gone = remove(path(kind, "signature")); !gone) return gone;
-        if (!file) return remove(path(kind, "source"));
+        auto gone = unlessMissing(_files.remove(path(kind, "signature")));
+        if (gone && !file) gone = unlessMissing(_files.remove(path(kind, "source")));
+        // After a power cut, a new source must not have the old signature.
+        if (gone) gone = unlessMissing(_files.syncDirectory(_directory));
+        if (!gone || !file) return gone;
         if (auto made = _files.createDirectories(_directory); !made) return made;
         if (auto copied = _files.copy(path(kind, "source"), *file); !copied) return copied;
         if (signature.empty()) return {};
@@ -40,10 +43,9 @@ private:
     {
         return _directory / fmt::format("{}.{}", kind, what);
     }
-    Result<void> remove(const std::filesystem::path& path)
+    static Result<void> unlessMissing(Result<void> done)
     {
-        auto removed = _files.remove(path);
-        return !removed && removed.error().code == ENOENT ? Result<void>() : removed;
+        return !done && done.error().code == ENOENT ? Result<void>() : done;
     }
 
     FileSystem& _files;
