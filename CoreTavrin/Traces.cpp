@@ -2,6 +2,7 @@
 
 #include <cerrno>
 #include <filesystem>
+#include <memory>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -31,11 +32,13 @@ public:
     {
         std::error_code error;
         const bool isLink = fs::is_symlink(path, error);
-        fs::remove_all(path, error);
+        const std::uintmax_t removed = fs::remove_all(path, error);
         if (error)
             add(path, error.message());
-        else if (isLink)
-            add(path, "was a symbolic link; what it points to stays");
+        else if (removed > 0)
+            if (const auto synced = _files->syncDirectory(path.parent_path()); !synced)
+                add(path, "may come back after a power cut: " + synced.error().reason());
+        if (!error && isLink) add(path, "was a symbolic link; what it points to stays");
     }
     /// Removes the temporary files that a killed daemon left. Other programs use this directory, too.
     void removeTemporary(const fs::path& directory)
@@ -55,12 +58,11 @@ public:
     void removeDaemonSettings(const fs::path& path)
     {
         remove(path.string() + ".corrupt");
-        const auto files = platform::makeSystemFiles();
-        const auto bytes = files->read(path, kLargestSettings);
+        const auto bytes = _files->read(path, kLargestSettings);
         if (!bytes && bytes.error().code == ENOENT) return;
         const auto parsed = bytes ? platform::parseJson(bytes->view()) : std::unexpected(bytes.error());
         if (!parsed || !parsed->asDictionary()) return add(path, parsed ? "not an object" : parsed.error().reason());
-        platform::UserDefaults settings(*files, path, nullptr);
+        platform::UserDefaults settings(*_files, path, nullptr);
         for (const auto& [key, value] : *parsed->asDictionary())
             if (const KnownSetting* known = knownSetting(key); known && known->isDaemons) settings.remove(key);
         if (const auto written = settings.synchronize(); !written) add(path, written.error().reason());
@@ -73,6 +75,8 @@ private:
     {
         problems.push_back(fmt::format("{}: {}", path.string(), problem));
     }
+
+    const std::unique_ptr<platform::FileSystem> _files = platform::makeSystemFiles();
 };
 
 } // namespace
