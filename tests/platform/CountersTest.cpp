@@ -95,15 +95,6 @@ TEST_F(CountersTest, HostileNamesFillNeitherMemoryNorFileAndEndNoOthersCounts)
     EXPECT_EQ(later.value("used"), 4) << "also after a restart";
 }
 
-TEST_F(CountersTest, WhatWasSynchronizedOutlivesAKill)
-{
-    CounterStore().synchronize();
-    CounterStore counters(files, path, queue);
-    counters.add("a", 1);
-    counters.synchronize();
-    EXPECT_EQ(CounterStore(files, path, queue).value("a"), 1);
-}
-
 TEST_F(CountersTest, AWriteThatFailedIsTriedAgain)
 {
     CounterStore counters(files, path, queue);

@@ -1,15 +1,16 @@
 #pragma once
 
+#include <filesystem>
 #include <map>
 #include <memory>
 #include <string>
 
+#include "platform/files/Files.h"
 #include "platform/net/BackgroundSession.h"
 #include "platform/net/NetworkStatus.h"
 #include "tests/support/FakeUrlLoader.h"
 #include "tests/support/ManualClock.h"
 #include "tests/support/ManualExecutor.h"
-#include "tests/support/MemoryFiles.h"
 
 namespace platform::test {
 
@@ -17,14 +18,14 @@ namespace platform::test {
 /// each. The network is there and free of charge.
 class BackgroundLoads final : public BackgroundSessions {
 public:
-    BackgroundLoads(MemoryFiles& files, ManualClock& clock, ManualExecutor& executor)
+    BackgroundLoads(FileSystem& files, const std::filesystem::path& root, ManualClock& clock, ManualExecutor& executor)
         : _sessions(makeBackgroundSessions({.files = files,
                                             .loader = _loader,
                                             .network = network,
                                             .clock = clock,
                                             .executor = executor,
-                                            .directory = "/state/transfers",
-                                            .temporary = "/tmp"}))
+                                            .directory = root / "state/transfers",
+                                            .temporary = root / "tmp"}))
     {
         network.set({});
     }

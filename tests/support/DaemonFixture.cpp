@@ -18,7 +18,7 @@ std::vector<std::string> RecordingSessionManager::takeClasses()
     return classes;
 }
 
-DaemonTest::DaemonTest() = default;
+DaemonTest::DaemonTest(platform::FileSystem* disk, std::filesystem::path root) : device(disk, std::move(root)) {}
 
 DaemonTest::~DaemonTest()
 {

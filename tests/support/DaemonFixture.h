@@ -35,7 +35,8 @@ public:
 
 /// The whole daemon on a device of twins: the test is the clients, the service and the clock.
 struct DaemonTest : testing::Test {
-    DaemonTest();
+    /// On the twin's files, or in a directory of another file system.
+    explicit DaemonTest(platform::FileSystem* disk = nullptr, std::filesystem::path root = "/");
     ~DaemonTest() override;
 
     /// Lets everything under way end.

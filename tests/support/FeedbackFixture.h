@@ -17,7 +17,8 @@ namespace tavrin::test {
 
 /// The daemon with its real sessions: feedback goes from the clients to files and uploads.
 struct FeedbackTest : DaemonTest {
-    FeedbackTest()
+    explicit FeedbackTest(platform::FileSystem* disk = nullptr, std::filesystem::path root = "/")
+        : DaemonTest(disk, std::move(root))
     {
         recordFeedback = false;
         device.files.directories.insert("/tmp");

@@ -44,7 +44,8 @@ std::unique_ptr<MemoryPressure::Watch> FakeMemoryPressure::watch(std::function<v
     return std::make_unique<Registration>(*this, std::move(critical));
 }
 
-TestDevice::TestDevice()
+TestDevice::TestDevice(FileSystem* disk_, std::filesystem::path root_)
+    : disk(disk_ ? *disk_ : files), root(std::move(root_))
 {
     failOnReplyMisuse();
     Log::privateData = true;

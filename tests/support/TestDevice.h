@@ -112,41 +112,45 @@ struct FakeNotifier final : SystemNotifier {
     void post(const std::string& name) override { posted.push_back(name); }
 };
 
-/// A device of twins, on one thread.
+/// A device of twins, on one thread. Its files are in memory, its settings nowhere; or both are in a directory of
+/// another file system.
 struct TestDevice : ByHand {
-    TestDevice();
+    explicit TestDevice(FileSystem* disk = nullptr, std::filesystem::path root = "/");
     ~TestDevice();
 
     MemoryFiles files;
-    UserDefaults userDefaults;
+    FileSystem& disk;
+    const std::filesystem::path root;
+    UserDefaults userDefaults =
+        &disk == &files ? UserDefaults() : UserDefaults(disk, root / "config/settings.json", makeQueue("settings"));
     UserDefaults lookupDefaults;
     NotificationCenter notifications;
-    CounterStore counters{files, "/state/counters.json", makeQueue("counters")};
+    CounterStore counters{disk, root / "state/counters.json", makeQueue("counters")};
     Transactions transactions;
     FakeLocale locale;
     FakeLocation location;
     FakeProfile profile;
     FakeApplications applications;
     FakeSubscriptions subscriptions;
-    std::unique_ptr<DataDetectorStore> dataDetectors = makeDataDetectorStore(files, "/data/data-detectors");
+    std::unique_ptr<DataDetectorStore> dataDetectors = makeDataDetectorStore(disk, root / "data/data-detectors");
     FakeProcesses processes;
     FakeMemoryPressure memoryPressure;
     FakeNotifier notifier;
     FakeUrlLoader loader;
     NetworkStatus network; ///< nothing is known until a test sets it
-    BackgroundLoads background{files, clock, executor};
+    BackgroundLoads background{disk, root, clock, executor};
     FakeActivityScheduler activities;
     FakeTransport ipc{executor, clock};
     Device device{.clock = clock,
                   .executor = executor,
                   .mainExecutor = executor,
-                  .files = files,
-                  .directories = {.caches = "/caches",
-                                  .config = "/config",
-                                  .state = "/state",
-                                  .data = "/data",
-                                  .runtime = "/run",
-                                  .temporary = "/tmp"},
+                  .files = disk,
+                  .directories = {.caches = root / "caches",
+                                  .config = root / "config",
+                                  .state = root / "state",
+                                  .data = root / "data",
+                                  .runtime = root / "run",
+                                  .temporary = root / "tmp"},
                   .userDefaults = userDefaults,
                   .lookupDefaults = lookupDefaults,
                   .notifications = notifications,
