@@ -3,10 +3,12 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <fcntl.h>
 #include <malloc.h>
 #include <poll.h>
 #include <sys/epoll.h>
 #include <sys/socket.h>
+#include <unistd.h>
 
 #include <fmt/format.h>
 #include <systemd/sd-bus.h>
@@ -125,12 +127,26 @@ void BusConnection::start()
     if (_state != State::Waiting) return;
     _state = State::Open;
 
+    if (const int result = openBus(); result < 0) return end(describe(result));
+    setsockopt(_fd, SOL_SOCKET, SO_SNDBUF, &kSocketBuffer, sizeof(kSocketBuffer)); // sd-bus takes 8 MiB where it may
+
+    startTimer();
+    _source = _context->pool.watch(_fd, _lane, [weak = weak_from_this()](std::uint32_t events) {
+        if (auto self = weak.lock()) self->ready(events);
+    });
+    drive(true);
+    updateEvents();
+}
+
+/// Creates the sd-bus object, which writes to the peer's socket and reads a pipe. Returns a negative errno if it fails.
+int BusConnection::openBus()
+{
     sd_bus* bus = nullptr;
     sd_id128_t serverId;
     int result = sd_bus_new(&bus);
-    if (result < 0) return end("out of memory");
+    if (result < 0) return result;
     _bus.reset(bus);
-    if (result >= 0) result = sd_id128_randomize(&serverId);
+    result = sd_id128_randomize(&serverId);
     if (result >= 0) result = sd_bus_set_server(bus, true, serverId);
     if (result >= 0) result = sd_bus_negotiate_fds(bus, true);
     if (result >= 0)
@@ -140,25 +156,23 @@ void BusConnection::start()
                 return static_cast<BusConnection*>(self)->onMessage(message);
             },
             this);
-    int pair[2] = {-1, -1};
-    if (result >= 0 && socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0, pair) != 0) result = -errno;
-    FileHandle input(pair[0]);
-    _input.emplace(_socket.fd(), FileHandle(pair[1]));
-    if (result >= 0) result = sd_bus_set_fd(bus, input.fd(), _socket.fd());
-    if (result >= 0) {
-        (void)input.release();
-        _fd = _socket.release();
-    }
-    if (result >= 0) result = sd_bus_start(bus);
-    if (result < 0) return end(describe(result));
-    setsockopt(_fd, SOL_SOCKET, SO_SNDBUF, &kSocketBuffer, sizeof(kSocketBuffer)); // sd-bus takes 8 MiB where it may
+    if (result < 0) return result;
 
-    startTimer();
-    _source = _context->pool.watch(_fd, _lane, [weak = weak_from_this()](std::uint32_t events) {
-        if (auto self = weak.lock()) self->ready(events);
-    });
-    drive(true);
-    updateEvents();
+    // sd-bus sends file handles only if both of its ends are sockets when it starts. A pipe costs less to pass through.
+    int pair[2], ends[2];
+    if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0, pair) != 0) return -errno;
+    FileHandle input(pair[0]);
+    const FileHandle other(pair[1]);
+    if (pipe2(ends, O_CLOEXEC | O_NONBLOCK) != 0) return -errno;
+    const FileHandle readEnd(ends[0]);
+    _input.emplace(_socket.fd(), FileHandle(ends[1]));
+    result = sd_bus_set_fd(bus, input.fd(), _socket.fd());
+    if (result < 0) return result;
+    const int inputFd = input.release();
+    _fd = _socket.release();
+    result = sd_bus_start(bus);
+    if (result < 0) return result;
+    return dup3(readEnd.fd(), inputFd, O_CLOEXEC) < 0 ? -errno : 0;
 }
 
 void BusConnection::push(std::string_view signal, const Message& arguments)

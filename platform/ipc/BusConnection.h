@@ -67,6 +67,7 @@ private:
 
     // the owner's operations
     void start();
+    [[nodiscard]] int openBus();
     void push(std::string_view signal, const Message& arguments);
     void pushFailed(const std::string& reason) const;
     void invalidate();

@@ -4,15 +4,14 @@
 #include <bit>
 #include <cerrno>
 #include <cstring>
+#include <fcntl.h>
 #include <sys/socket.h>
+#include <unistd.h>
 #include <utility>
 
 namespace platform::ipc {
 
 namespace {
-
-/// Bytes of a large message that are passed in one step; they fit into the buffer of an empty pair.
-constexpr std::size_t kStep = 64u << 10;
 
 std::uint32_t numberAt(std::span<const char, kFixedHeader> header, std::size_t offset)
 {
@@ -51,9 +50,10 @@ BusInput::Outcome BusInput::fill()
     return outcomeOf(got);
 }
 
+/// Writes at most `kReadAhead` bytes. They fit, because sd-bus has read what was written before.
 bool BusInput::write(std::span<const char> bytes)
 {
-    return send(_pair.fd(), bytes.data(), bytes.size(), MSG_NOSIGNAL) == static_cast<ssize_t>(bytes.size());
+    return ::write(_pipe.fd(), bytes.data(), bytes.size()) == static_cast<ssize_t>(bytes.size());
 }
 
 void BusInput::consume(std::size_t count)
@@ -95,10 +95,8 @@ BusInput::Outcome BusInput::pass()
         consume(count);
         _left -= count;
     } else {
-        std::array<char, kStep> bytes;
-        const ssize_t got = recv(_socket, bytes.data(), std::min(_left, bytes.size()), 0);
+        const ssize_t got = splice(_socket, nullptr, _pipe.fd(), nullptr, _left, SPLICE_F_NONBLOCK);
         if (got <= 0) return outcomeOf(got);
-        if (!write({bytes.data(), static_cast<std::size_t>(got)})) return Outcome::Ended;
         _left -= static_cast<std::size_t>(got);
     }
     if (_left == 0) _announced = 0;

@@ -14,12 +14,12 @@ namespace platform::ipc {
 /// Checks a peer's input before sd-bus reads it.
 ///
 /// sd-bus allocates whatever size a message's header announces, up to 128 MiB, and accepts every file handle. Therefore
-/// it doesn't read the peer's socket: it reads one end of a socket pair, and this class writes permitted input to the
-/// other end. It passes the authentication line by line, then one message at a time: the owner learns the size of a
-/// message from its fixed header before any of it is passed. File handles are dropped.
+/// it doesn't read the peer's socket: it reads a pipe, and this class writes permitted input to the other end. It
+/// passes the authentication line by line, then one message at a time: the owner learns the size of a message from its
+/// fixed header before any of it is passed. File handles are dropped.
 ///
-///     socket → fill → _buffer (at most `kReadAhead`) → pair → sd-bus
-///     socket → pair, for the rest of a larger message
+///     socket → fill → _buffer (at most `kReadAhead`) → pipe → sd-bus
+///     socket → pipe, for the rest of a larger message
 ///
 /// Owned by its connection and confined to the connection's lane.
 class BusInput {
@@ -34,9 +34,9 @@ public:
     /// Bytes that are read before the size of a message is known; also the longest line.
     static constexpr std::size_t kReadAhead = 4096;
 
-    /// `socket` is the peer's and must outlive this object; `pair` is the end that sd-bus doesn't own. Both are
+    /// `socket` is the peer's and must outlive this object; `pipe` is the end that sd-bus doesn't own. Both are
     /// non-blocking.
-    BusInput(int socket, FileHandle pair) : _socket(socket), _pair(std::move(pair)) {}
+    BusInput(int socket, FileHandle pipe) : _socket(socket), _pipe(std::move(pipe)) {}
 
     /// Call this for each event of the socket; `isLast` if the peer has gone, so that no event follows.
     void wake(bool isLast)
@@ -63,7 +63,7 @@ private:
     void consume(std::size_t count);
 
     const int _socket;
-    const FileHandle _pair;
+    const FileHandle _pipe;
     std::string _buffer;
     std::size_t _announced = 0;
     std::size_t _left = 0; // bytes of the current message that are not passed yet
