@@ -188,17 +188,19 @@ bool Client::wait(const std::function<bool()>& done, Duration timeout, int descr
 {
     const std::uint64_t deadline = monotonicMicroseconds() + microseconds(timeout);
     sd_bus* bus = _impl->bus.get();
+    bool mayHaveInput = false;
     for (;;) {
         for (auto& [answer, error] : std::exchange(_impl->failures, {}))
             if (answer) answer(std::unexpected(std::move(error)));
         if (done()) return true;
 
-        int result = sd_bus_process(bus, nullptr);
-        if (result < 0) return false;
-        if (result > 0 || !_impl->failures.empty()) continue;
+        // Waits first: after a call, reading at once would return nothing.
         const std::uint64_t now = monotonicMicroseconds();
-        if (now >= deadline) return false;
-        if (!waitForInput(bus, descriptor, now, deadline)) return false;
+        if (!mayHaveInput && !waitForInput(bus, descriptor, now, deadline)) return false;
+        const int result = sd_bus_process(bus, nullptr);
+        if (result < 0) return false;
+        mayHaveInput = result > 0 || !_impl->failures.empty();
+        if (!mayHaveInput && now >= deadline) return false;
     }
 }
 
