@@ -60,15 +60,15 @@ std::size_t memoryOf(const Message& message)
     return size + records.size;
 }
 
-void ReplyBacklog::runWithRoom(Queue::Task task)
+std::shared_ptr<Event> ReplyBacklog::awaitedRoom()
 {
-    std::shared_ptr<Event> room;
-    {
-        MutexLock lock(_mutex);
-        if (_bytes >= _limit) room = _waiting.emplace_back(std::make_shared<Event>());
-    }
-    if (!room) return task();
-    Queue::current()->suspendUntil(*room, kForever, [this, task = std::move(task)]() mutable {
+    MutexLock lock(_mutex);
+    return _bytes < _limit ? nullptr : _waiting.emplace_back(std::make_shared<Event>());
+}
+
+void ReplyBacklog::runLater(const Event& room, Queue::Task task)
+{
+    Queue::current()->suspendUntil(room, kForever, [this, task = std::move(task)]() mutable {
         task();
         wakeNext(); // the task may have given no reply
     });

@@ -19,11 +19,19 @@ public:
 
     /// Runs `task` at once, or suspends the current queue until there is room. Call it from a task of a serial queue.
     /// The backlog must outlive the task.
-    void runWithRoom(Queue::Task task);
+    template <class Task> void runWithRoom(Task task)
+    {
+        auto room = awaitedRoom();
+        if (!room) return task();
+        runLater(*room, std::move(task));
+    }
     void add(std::size_t bytes);
     void remove(std::size_t bytes);
 
 private:
+    /// Returns null if there is room.
+    [[nodiscard]] std::shared_ptr<Event> awaitedRoom();
+    void runLater(const Event& room, Queue::Task task);
     void wakeNext();
 
     const std::size_t _limit;
