@@ -105,12 +105,9 @@ std::vector<Row> events()
 {
     constexpr int kEvents = 20'000;
     DaemonUnderLoad daemon;
-    const Directory directory;
-    const int socket = listenAt(directory / "socket");
-    const Process server({EVENTS}, {}, socket);
+    const PlainServer server;
     Clients clients;
-    for (int i = 0; i < kClients; ++i)
-        clients.push_back(TAVClient::connect("unix:path=" + (directory / "socket").string()).value());
+    for (int i = 0; i < kClients; ++i) clients.push_back(server.client());
     return {compare(
         "events of 8 clients into their sessions, CPU an event, beside a server that decodes them", 7, 1.7,
         [&] { return daemon.cpuOfEvents(kEvents); },

@@ -109,6 +109,16 @@ Row compare(std::string what, int rounds, double limit, const std::function<doub
     return {std::move(what), seconds(median(mine)), seconds(median(others)), ratio, limit, "×"};
 }
 
+std::vector<Row> callRows(const std::string& what, double limit, double daemon, double server, double echo)
+{
+    const auto row = [](std::string text, double ours, double beside, double atMost) {
+        return Row{std::move(text), seconds(ours), seconds(beside), ours / beside, atMost, "×"};
+    };
+    return {row(what + ", beside a socket echo of as many bytes, on one core", daemon, echo, limit),
+            row("the same beside a server on sd-bus that only replies", daemon, server, kReportedOnly),
+            row("that server beside the echo", server, echo, kReportedOnly)};
+}
+
 OneCore::OneCore()
 {
     cpu_set_t one;
@@ -302,6 +312,21 @@ std::unique_ptr<TAVClient> Daemon::clientAt(const std::string& address, bool wit
     require((*client)->configure({"com.quorvane.bench", agent}).has_value(), "configure");
     if (withBag) require((*client)->wait([&] { return bagArrived; }, std::chrono::seconds(30)), "no bag");
     (*client)->onBagDidLoad([](const TAVBagAnswer&) {});
+    return std::move(*client);
+}
+
+PlainServer::PlainServer(std::size_t answerSize)
+{
+    const int socket = listenAt(_home / "socket");
+    _process = std::make_unique<Process>(std::vector<std::string>{SERVER, std::to_string(answerSize)},
+                                         std::vector<std::string>{}, socket);
+    close(socket);
+}
+
+std::unique_ptr<TAVClient> PlainServer::client() const
+{
+    auto client = TAVClient::connect("unix:path=" + (_home / "socket").string());
+    require(client.has_value(), "the server doesn't answer");
     return std::move(*client);
 }
 

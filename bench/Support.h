@@ -54,6 +54,11 @@ struct Row {
 [[nodiscard]] Row compare(std::string what, int rounds, double limit, const std::function<double()>& ours,
                           const std::function<double()>& beside);
 
+/// The rows of a call to the daemon, beside `Echo` and beside `PlainServer`, from its seconds with each. The last two
+/// have no limit: they say how much of the first is the daemon's own part.
+[[nodiscard]] std::vector<Row> callRows(const std::string& what, double limit, double daemon, double server,
+                                        double echo);
+
 /// "123 ns", "12.3 µs", "4.5 ms".
 [[nodiscard]] std::string seconds(double value);
 
@@ -121,6 +126,18 @@ public:
 private:
     [[nodiscard]] static std::unique_ptr<TAVClient> clientAt(const std::string& address, bool withBag,
                                                              const std::string& agent);
+    Directory _home; // outlives the process
+    std::unique_ptr<Process> _process;
+};
+
+/// A server on sd-bus that only replies, to each request with `answerSize` bytes, and drops events.
+class PlainServer {
+public:
+    explicit PlainServer(std::size_t answerSize = 0);
+    [[nodiscard]] pid_t pid() const { return _process->pid(); }
+    [[nodiscard]] std::unique_ptr<TAVClient> client() const;
+
+private:
     Directory _home; // outlives the process
     std::unique_ptr<Process> _process;
 };
