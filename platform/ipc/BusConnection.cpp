@@ -127,7 +127,9 @@ void BusConnection::start()
     if (_state != State::Waiting) return;
     _state = State::Open;
 
-    if (const int result = openBus(); result < 0) return end(describe(result));
+    _fd = _socket.fd();
+    _input.emplace(_fd);
+    if (const int result = openBus(std::move(_socket)); result < 0) return end(describe(result));
     setsockopt(_fd, SOL_SOCKET, SO_SNDBUF, &kSocketBuffer, sizeof(kSocketBuffer)); // sd-bus takes 8 MiB where it may
 
     startTimer();
@@ -138,8 +140,8 @@ void BusConnection::start()
     updateEvents();
 }
 
-/// Creates the sd-bus object, which writes to the peer's socket and reads a pipe. Returns a negative errno if it fails.
-int BusConnection::openBus()
+/// Creates the sd-bus object, which writes to `output` and reads a pipe. Returns a negative errno if it fails.
+int BusConnection::openBus(FileHandle output)
 {
     sd_bus* bus = nullptr;
     sd_id128_t serverId;
@@ -165,14 +167,30 @@ int BusConnection::openBus()
     const FileHandle other(pair[1]);
     if (pipe2(ends, O_CLOEXEC | O_NONBLOCK) != 0) return -errno;
     const FileHandle readEnd(ends[0]);
-    _input.emplace(_socket.fd(), FileHandle(ends[1]));
-    result = sd_bus_set_fd(bus, input.fd(), _socket.fd());
+    _input->setPipe(FileHandle(ends[1]));
+    result = sd_bus_set_fd(bus, input.fd(), output.fd());
     if (result < 0) return result;
     const int inputFd = input.release();
-    _fd = _socket.release();
+    (void)output.release();
     result = sd_bus_start(bus);
     if (result < 0) return result;
     return dup3(readEnd.fd(), inputFd, O_CLOEXEC) < 0 ? -errno : 0;
+}
+
+/// After a failed write sd-bus reads nothing more. Replaces it by another, which reads the rest of what the peer sent
+/// and writes nothing. Returns false if that fails.
+bool BusConnection::readOn()
+{
+    if (_state != State::Open || _failedBus || !_authenticated || _messageDue) return false;
+    _peerGone = true;
+    _input->wake(true);
+    _fed = false;
+    _failedBus = std::move(_bus);
+    FileHandle nowhere(open("/dev/null", O_WRONLY | O_CLOEXEC));
+    if (!nowhere || openBus(std::move(nowhere)) < 0 || !_input->passOwnLines()) return false;
+    while (sd_bus_is_ready(_bus.get()) <= 0)
+        if (sd_bus_process(_bus.get(), nullptr) <= 0) return false;
+    return true;
 }
 
 void BusConnection::push(std::string_view signal, const Message& arguments)
@@ -206,7 +224,7 @@ void BusConnection::invalidate()
     _state = State::Draining;
     announceEnd();
     dropCalls();
-    if (_unwritten.empty()) return close();
+    if (_unwritten.empty() || _peerGone) return close();
     startTimer();
     updateEvents();
 }
@@ -238,7 +256,8 @@ void BusConnection::drive(bool writable)
     _heldBack = false;
     for (unsigned step = 0; step < kStepsPerTurn; ++step) {
         if (_state == State::Closed) return;
-        if (sd_bus_is_open(_bus.get()) <= 0) return end({}); // before sd-bus closes the watched descriptor
+        // Before sd-bus closes the watched descriptor.
+        if (sd_bus_is_open(_bus.get()) <= 0 && !readOn()) return end({});
         if (!std::exchange(writable, false) && !_fed) {
             if (!feed()) return;
             continue;
@@ -484,8 +503,8 @@ BusMessage BusConnection::encodeAnswer(const PendingCall& call, CallResult resul
 
 void BusConnection::send(sd_bus_message* message, std::size_t size)
 {
-    // Writing to a disconnected peer would make sd-bus drop the peer's last input.
-    if (_state != State::Open || peerHasGone()) return;
+    if (_state != State::Open || _peerGone) return;
+    if (_messageDue && peerHasGone()) return; // if the write failed, the part that sd-bus has read would be lost
     sd_bus_message_set_sender(message, kOwnName);
     if (!sd_bus_message_get_destination(message)) sd_bus_message_set_destination(message, kPeerName);
     const int result = sd_bus_send(_bus.get(), message, nullptr);
@@ -493,6 +512,7 @@ void BusConnection::send(sd_bus_message* message, std::size_t size)
         kLog.error("a message to process {} can't be sent: {}", _peer.pid, std::strerror(-result));
         return;
     }
+    if (result < 0) return driveAgain();
     settleWriteQueue(size + kMessageOverhead);
     if (_unwritten.size() > 1 && _unwrittenBytes > _context->limits.queuedBytes) endUnread("it doesn't read");
 }
@@ -500,6 +520,7 @@ void BusConnection::send(sd_bus_message* message, std::size_t size)
 /// Updates the count of unwritten bytes from sd-bus's write queue. Each new message there counts as `sizeOfNewest`.
 void BusConnection::settleWriteQueue(std::size_t sizeOfNewest)
 {
+    if (_failedBus) return; // it keeps them
     std::uint64_t queued = 0;
     if (sd_bus_get_n_queued_write(_bus.get(), &queued) < 0) queued = 0;
     std::size_t bytes = _unwrittenBytes;
@@ -600,6 +621,7 @@ void BusConnection::close()
 void BusConnection::dispose()
 {
     _bus.reset();
+    _failedBus.reset();
     _input.reset();
     _socket = FileHandle();
     _context->release(_peer.pid);

@@ -67,7 +67,8 @@ private:
 
     // the owner's operations
     void start();
-    [[nodiscard]] int openBus();
+    [[nodiscard]] int openBus(FileHandle output);
+    [[nodiscard]] bool readOn();
     void push(std::string_view signal, const Message& arguments);
     void pushFailed(const std::string& reason) const;
     void invalidate();
@@ -124,6 +125,7 @@ private:
     int _fd = -1;                   // the peer's socket, which sd-bus writes to and owns
     std::optional<BusInput> _input; // from `start`
     std::unique_ptr<sd_bus, BusUnref> _bus;
+    std::unique_ptr<sd_bus, BusUnref> _failedBus; // the one that owns the socket, after a write failed
     std::unique_ptr<WorkerPool::Source> _source;
     std::uint32_t _watchedEvents = 0;
     bool _peerGone = false;

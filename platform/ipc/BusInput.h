@@ -34,9 +34,10 @@ public:
     /// Bytes that are read before the size of a message is known; also the longest line.
     static constexpr std::size_t kReadAhead = 4096;
 
-    /// `socket` is the peer's and must outlive this object; `pipe` is the end that sd-bus doesn't own. Both are
-    /// non-blocking.
-    BusInput(int socket, FileHandle pipe) : _socket(socket), _pipe(std::move(pipe)) {}
+    /// `socket` is the peer's, is non-blocking, and must outlive this object.
+    explicit BusInput(int socket) : _socket(socket) {}
+    /// Sets the end of the pipe that sd-bus doesn't own; it is non-blocking.
+    void setPipe(FileHandle pipe) { _pipe = std::move(pipe); }
 
     /// Call this for each event of the socket; `isLast` if the peer has gone, so that no event follows.
     void wake(bool isLast)
@@ -46,6 +47,8 @@ public:
     }
     /// Passes one line of the authentication.
     [[nodiscard]] Outcome passLine();
+    /// Passes an authentication in place of the peer's. Returns false if the pipe has no room.
+    [[nodiscard]] bool passOwnLines();
     /// Reads the header of the next message; call it between messages only. After Passed, `announced` is the size.
     [[nodiscard]] Outcome look();
     /// Returns the size in bytes, with its header, of the next or current message; 0 between messages before `look`.
@@ -63,7 +66,7 @@ private:
     void consume(std::size_t count);
 
     const int _socket;
-    const FileHandle _pipe;
+    FileHandle _pipe;
     std::string _buffer;
     std::size_t _announced = 0;
     std::size_t _left = 0; // bytes of the current message that are not passed yet

@@ -300,6 +300,25 @@ TEST(Ipc, WhatAPeerSaidBeforeItVanishedStillArrivesAheadOfTheEnd)
     EXPECT_TRUE(call(*service.connect(), method("Count")));
 }
 
+TEST(Ipc, WhatAPeerSaidArrivesThoughAWriteToItFails)
+{
+    Service service;
+    std::promise<void> entered, gate;
+    service.onPushError = [&] {
+        entered.set_value();
+        gate.get_future().wait();
+    };
+    auto client = service.connect();
+    service.await([&] { return service.connections.size() == 1; });
+    service.connections[0]->push("Nothing", {}); // no such signal: its failure holds the transport
+    entered.get_future().wait();
+    service.connections[0]->push("Told", {{"too late", Dictionary()}, {}});
+    for (const char* text : {"a", "b"}) client->call(probe().name, method("Note"), {{text}, {}}, {});
+    client.reset();
+    gate.set_value();
+    service.await([&] { return service.notes == std::vector<std::string>{"a", "b", "<invalidated>"}; });
+}
+
 TEST(Ipc, WhatAPeerSaidBeforeItVanishedIsReadWithinTheLimits)
 {
     Service service({.callsInFlight = 2, .bytes = 300u << 10});
