@@ -17,10 +17,16 @@ using namespace std::chrono_literals;
 Duration retryDelay(unsigned failures, double jitter)
 {
     constexpr Duration kFirst = 30s;
-    constexpr Duration kLongest = 1h;
-    const unsigned doublings = std::min(std::max(failures, 1u) - 1, 16u);
-    const double longest = std::min(toSeconds(kFirst) * (1u << doublings), toSeconds(kLongest));
-    return durationFromSeconds(longest * (0.5 + std::clamp(jitter, 0.0, 1.0) / 2));
+    constexpr Duration kSecond = 2h;
+    constexpr Duration kLongest = 4h;
+    const double spread = std::clamp(jitter, 0.0, 1.0);
+    if (failures <= 1) return durationFromSeconds(toSeconds(kFirst) * (0.5 + spread / 2));
+    return durationFromSeconds(toSeconds(failures == 2 ? kSecond : kLongest) * (0.25 + 0.75 * spread));
+}
+
+Duration startDelay(Duration window, double jitter)
+{
+    return durationFromSeconds(toSeconds(window) * std::clamp(jitter, 0.0, 1.0));
 }
 
 bool isTransient(const Error& error)
@@ -32,15 +38,17 @@ bool isTransient(const Error& error)
     return std::ranges::find(kFinal, error.code) == kFinal.end();
 }
 
-std::optional<Duration> retryAfter(std::string_view field, Date now)
+std::optional<Duration> retryAfter(std::string_view field, Date now, double jitter)
 {
     constexpr Duration kLongest = 24h;
+    constexpr Duration kDateSpread = 30min;
+    const double spread = std::clamp(jitter, 0.0, 1.0);
     const bool isNumber = !field.empty() && std::ranges::all_of(field, [](char c) { return c >= '0' && c <= '9'; });
     if (isNumber) {
         std::uint64_t seconds = 0;
         const auto read = std::from_chars(field.data(), field.data() + field.size(), seconds);
         if (read.ec != std::errc() || seconds >= 24 * 60 * 60) return kLongest;
-        return std::chrono::seconds(seconds);
+        return std::min(durationFromSeconds(static_cast<double>(seconds) * (1 + spread / 2)), kLongest);
     }
     constexpr std::size_t kLongestDate = 64;
     if (field.size() > kLongestDate) return std::nullopt;
@@ -48,7 +56,8 @@ std::optional<Duration> retryAfter(std::string_view field, Date now)
     if (date < 0) return std::nullopt;
     // Computed in seconds: a date in the far future doesn't fit nanoseconds.
     const double wait = static_cast<double>(date) - secondsSince1970(now);
-    return std::clamp<Duration>(durationFromSeconds(wait), 0s, kLongest);
+    if (wait <= 0) return 0s;
+    return std::min<Duration>(durationFromSeconds(wait + toSeconds(kDateSpread) * spread), kLongest);
 }
 
 } // namespace platform

@@ -67,6 +67,7 @@ public:
     void resume() override;
     void cancel() override;
     void setNote(Value note) override;
+    void setStartWindow(Duration window) override;
     [[nodiscard]] std::uint64_t identifier() const override { return _identifier; }
     [[nodiscard]] const UrlRequest& originalRequest() const override { return *_request; }
     [[nodiscard]] bool isUpload() const override { return _isUpload; }
@@ -202,6 +203,12 @@ public:
             _save(*entry);
         });
     }
+    void setStartWindow(std::uint64_t identifier, Duration window)
+    {
+        _queue->sync([&] {
+            if (Entry* entry = _find(identifier)) entry->startWindow = window;
+        });
+    }
     /// Removes a task that was never resumed. Called by its destructor.
     void released(std::uint64_t identifier)
     {
@@ -215,6 +222,7 @@ private:
         StoredTask stored;
         std::weak_ptr<Task> handle;
         std::shared_ptr<Task> kept; ///< null before resume
+        Duration startWindow{};
         std::shared_ptr<UrlTask> attempt;
         std::uint64_t attemptNumber = 0;
         std::string problem; ///< of the last failed attempt
@@ -254,7 +262,9 @@ private:
     {
         return _network && _network->online && (!_network->metered || _configuration.allowsMetered);
     }
+    void _retryNow(std::optional<std::string_view> host);
     void _hold(const UrlRequest& request, const UrlResponse& response);
+    [[nodiscard]] double _jitter() { return std::uniform_real_distribution<double>()(_random); }
 
     void _schedule(const Entry& entry);
     void _pump();
@@ -318,6 +328,11 @@ void Task::setNote(Value note)
         _note = note;
     }
     if (const auto session = _session.lock()) session->setNote(_identifier, note);
+}
+
+void Task::setStartWindow(Duration window)
+{
+    if (const auto session = _session.lock()) session->setStartWindow(_identifier, window);
 }
 
 // ---- the store ----
@@ -408,7 +423,10 @@ void Session::_resume(const std::shared_ptr<Task>& task)
     if (!entry || entry->stored.resumed || entry->stored.outcome) return;
     entry->kept = task;
     entry->stored.resumed = true;
-    entry->stored.deadline = _time.now() + std::min<Duration>(_configuration.resourceTimeout, kLongestResourceTimeout);
+    const Duration now = _time.now();
+    entry->stored.deadline = now + std::min<Duration>(_configuration.resourceTimeout, kLongestResourceTimeout);
+    if (entry->startWindow > Duration::zero())
+        entry->stored.notBefore = now + startDelay(entry->startWindow, _jitter());
     _save(*entry);
     _followNetwork();
     _schedule(*entry);
@@ -456,22 +474,31 @@ void Session::_networkChanged()
     const bool wasOffline = _network && !_network->online;
     _network = _environment.network.current();
     for (auto& [identifier, entry] : _entries) {
-        if (entry.attempt && _network->online && !_mayTransfer()) {
-            _stopAttempt(entry);
-            _schedule(entry);
-        } else if (wasOffline && _network->online && !entry.attempt && entry.stored.notBefore > Duration::zero()) {
-            entry.stored.notBefore = Duration::zero(); // the failure came from the missing network
-            _schedule(entry);
-        }
+        if (!entry.attempt || !_network->online || _mayTransfer()) continue;
+        _stopAttempt(entry);
+        _schedule(entry);
     }
+    if (wasOffline && _network->online) _retryNow({}); // the failures came from the missing network
     _pump();
+}
+
+/// Ends the delays after failures: of the tasks to a host, or of all.
+void Session::_retryNow(std::optional<std::string_view> host)
+{
+    for (auto& [identifier, entry] : _entries) {
+        StoredTask& task = entry.stored;
+        if (entry.attempt || task.failures == 0 || task.notBefore == Duration::zero()) continue;
+        if (host && task.request->url.host() != *host) continue;
+        task.notBefore = Duration::zero();
+        _schedule(entry);
+    }
 }
 
 void Session::_hold(const UrlRequest& request, const UrlResponse& response)
 {
     const std::string* field = response.headers.find("Retry-After");
     if (!field) return;
-    const auto wait = retryAfter(*field, _environment.clock.wallNow());
+    const auto wait = retryAfter(*field, _environment.clock.wallNow(), _jitter());
     if (!wait || *wait <= Duration::zero()) return;
     const Duration until = _time.now() + *wait;
     // After a redirect both hosts belong to the service that sent Retry-After.
@@ -562,6 +589,7 @@ void Session::_ended(std::uint64_t identifier, std::uint64_t attempt, std::optio
     entry->attempt.reset();
     if (!error && response) {
         _hold(*entry->stored.request, *response);
+        if (response->statusCode >= 200 && response->statusCode < 400) _retryNow(entry->stored.request->url.host());
         if (!entry->stored.isUpload)
             if (auto synced = _store->syncDownload(identifier); !synced) error = std::move(synced.error());
     }
@@ -575,8 +603,7 @@ void Session::_ended(std::uint64_t identifier, std::uint64_t attempt, std::optio
 void Session::_retry(Entry& entry, const Error& error)
 {
     ++entry.stored.failures;
-    const double jitter = std::uniform_real_distribution<double>()(_random);
-    const Duration delay = retryDelay(entry.stored.failures, jitter);
+    const Duration delay = retryDelay(entry.stored.failures, _jitter());
     defaultLog().info("background task {} will be retried in {:.0f} s: {}", entry.stored.identifier, toSeconds(delay),
                       error.description());
     entry.problem = error.reason().empty() ? error.description() : error.reason();

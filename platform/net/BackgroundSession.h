@@ -27,6 +27,9 @@ public:
     /// Stores a value of the owner's choice with the task: JSON of at most 128 KiB. Logs and ignores a larger one.
     virtual void setNote(Value note) = 0;
     [[nodiscard]] virtual Value note() const = 0;
+    /// Makes the first attempt start at a random time within `window` after `resume`; by default it starts at once.
+    /// Call it before `resume`.
+    virtual void setStartWindow(Duration window) = 0;
     /// Returns true for an upload, false for a download.
     [[nodiscard]] virtual bool isUpload() const = 0;
 };
@@ -81,9 +84,10 @@ struct BackgroundSessionConfiguration {
 /// were never resumed are removed with their bodies.
 ///
 /// A resumed task waits while the network is offline, or metered if that isn't allowed. An attempt that fails below
-/// HTTP is repeated after growing, jittered delays until the resource time-out; permanent errors (a bad URL, a
-/// forbidden redirect, a response that is too large) end the task. An HTTP status always ends the task; if it comes
-/// with Retry-After (RFC 9110, 10.2.3; at most a day), the session's other tasks to that host wait.
+/// HTTP is repeated after growing, jittered delays until the resource time-out, and at once when the network is back or
+/// the host has answered another task with success; permanent errors (a bad URL, a forbidden redirect, a response that
+/// is too large) end the task. An HTTP status always ends the task; if it comes with Retry-After (RFC 9110, 10.2.3; at
+/// most a day), the session's other tasks to that host wait.
 ///
 /// An attempt that a kill interrupted is repeated with the same body: a service may receive a body twice, but never a
 /// truncated one as complete. A task's result is on disk before the delegate is called.

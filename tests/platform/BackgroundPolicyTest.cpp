@@ -15,18 +15,18 @@ namespace {
 
 using namespace std::chrono_literals;
 
-TEST(BackgroundPolicy, DelaysGrowToAnHour)
+TEST(BackgroundPolicy, DelaysSpreadDevicesThatFailedTogether)
 {
     const struct {
         unsigned failures;
         Duration shortest, longest;
-    } cases[]{{0, 15s, 30s},     {1, 15s, 30s},  {2, 30s, 60s},     {3, 1min, 2min},
-              {7, 16min, 32min}, {8, 30min, 1h}, {1000, 30min, 1h}, {4'000'000'000u, 30min, 1h}};
+    } cases[]{{0, 15s, 30s}, {1, 15s, 30s}, {2, 30min, 2h}, {3, 1h, 4h}, {4'000'000'000u, 1h, 4h}};
     for (const auto& c : cases) {
         EXPECT_EQ(retryDelay(c.failures, 0), c.shortest) << c.failures;
         EXPECT_EQ(retryDelay(c.failures, 1), c.longest) << c.failures;
         EXPECT_EQ(retryDelay(c.failures, 0.5), (c.shortest + c.longest) / 2) << c.failures;
     }
+    EXPECT_EQ(startDelay(1h, 0.25), 15min);
 }
 
 TEST(BackgroundPolicy, OnlyWhatMayGetBetterIsTriedAgain)
@@ -47,23 +47,29 @@ TEST(BackgroundPolicy, OnlyWhatMayGetBetterIsTriedAgain)
 TEST(BackgroundPolicy, RetryAfterIsSecondsOrADate)
 {
     const Date now = dateFromSecondsSince1970(784111777); // Sun, 06 Nov 1994 08:49:37 GMT
-    const std::pair<std::string_view, std::optional<Duration>> cases[]{
-        {"0", 0s},
-        {"120", 120s},
-        {"86400", 24h},
-        {"86401", 24h},
-        {"99999999999999999999999", 24h},
-        {"Sun, 06 Nov 1994 08:59:37 GMT", 10min},
-        {"Sunday, 06-Nov-94 08:59:37 GMT", 10min},
-        {"Sun, 06 Nov 1994 08:00:00 GMT", 0s},
-        {"Sun, 06 Nov 2094 08:49:37 GMT", 24h},
-        {"", std::nullopt},
-        {"-5", std::nullopt},
-        {"1.5", std::nullopt},
-        {"soon", std::nullopt},
-        {std::string_view("Sun, 06 Nov 1994 08:59:37 GMT                                            x"), std::nullopt},
+    const struct {
+        std::string_view field;
+        std::optional<Duration> shortest, longest;
+    } cases[]{
+        {"0", 0s, 0s},
+        {"120", 120s, 180s},
+        {"80000", 80000s, 24h},
+        {"86401", 24h, 24h},
+        {"99999999999999999999999", 24h, 24h},
+        {"Sun, 06 Nov 1994 08:59:37 GMT", 10min, 40min},
+        {"Sunday, 06-Nov-94 08:59:37 GMT", 10min, 40min},
+        {"Sun, 06 Nov 1994 08:49:37 GMT", 0s, 0s},
+        {"Sun, 06 Nov 2094 08:49:37 GMT", 24h, 24h},
+        {"", {}, {}},
+        {"-5", {}, {}},
+        {"1.5", {}, {}},
+        {"soon", {}, {}},
+        {"Sun, 06 Nov 1994 08:59:37 GMT                                            x", {}, {}},
     };
-    for (const auto& [field, wait] : cases) EXPECT_EQ(retryAfter(field, now), wait) << field;
+    for (const auto& c : cases) {
+        EXPECT_EQ(retryAfter(c.field, now, 0), c.shortest) << c.field;
+        EXPECT_EQ(retryAfter(c.field, now, 1), c.longest) << c.field;
+    }
 }
 
 TEST(LivedTime, CountsAbsenceAndSuspendButNoLeaps)

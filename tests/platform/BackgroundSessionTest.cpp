@@ -466,10 +466,54 @@ TEST_F(BackgroundSessionTest, FailedAttemptsAreMadeAgainUntilTheTimeIsUp)
         EXPECT_LE(process.time.pendingTimers(), 1u);
         process.advance(1min);
     }
-    EXPECT_GT(attempts, 24);
-    EXPECT_LT(attempts, 60) << "the delays grow";
+    EXPECT_GT(attempts, 6) << "the longest delay is four hours";
+    EXPECT_LT(attempts, 27) << "after two failures, the shortest is an hour";
     EXPECT_EQ(process.told(), (Told{fmt::format("1 0 {} note null", std::int64_t{kUrlTimedOut}), "all"}));
     EXPECT_EQ(process.time.pendingTimers(), 0u);
+}
+
+TEST_F(BackgroundSessionTest, ASuccessOfTheHostEndsItsDelays)
+{
+    Process process(root.path, {.identifier = "uploads", .parallelTransfers = 1});
+    (void)process.resumed("1");
+    (void)process.resumed("2", "https://b.example/");
+    for (int failure = 0; failure < 4; ++failure) {
+        process.fail(kUrlConnectionLost);
+        process.advance(failure == 1 ? 30s : 0s);
+    }
+    (void)process.resumed("3");
+    process.answer(503);
+    EXPECT_TRUE(process.attempts().empty()) << "refused: the others would be, too";
+    (void)process.resumed("4");
+    process.answer(200);
+    ASSERT_EQ(process.attempts().size(), 1u);
+    EXPECT_EQ(process.attempts()[0]->originalRequest().url.host(), "a.example");
+    process.answer(200);
+    EXPECT_TRUE(process.attempts().empty()) << "another host";
+}
+
+TEST_F(BackgroundSessionTest, AStartWindowHoldsForEveryReasonToStart)
+{
+    test::ManualClock clock;
+    {
+        Process process(root.path, {.identifier = "uploads"}, &clock);
+        for (int i = 0; i < 40; ++i) {
+            const auto task = process.upload("x");
+            task->setStartWindow(1h);
+            task->resume();
+        }
+        (void)process.resumed("y");
+        process.answer(200);
+        process.network.set({.online = false});
+        process.drain();
+        process.network.set({});
+        EXPECT_TRUE(process.attempts().empty()) << "neither a success nor the network ends the wait";
+    }
+    Process next(root.path, {.identifier = "uploads", .parallelTransfers = 100}, &clock);
+    next.advance(30min);
+    EXPECT_NEAR(static_cast<double>(next.attempts().size()), 20, 15);
+    next.advance(30min);
+    EXPECT_EQ(next.attempts().size(), 40u);
 }
 
 TEST_F(BackgroundSessionTest, WhatCantGetBetterEndsATask)
@@ -541,8 +585,8 @@ TEST_F(BackgroundSessionTest, AHostThatAsksForTimeIsLeftAlone)
     Process next(root.path, {.identifier = "uploads"}, &clock);
     next.advance(59min);
     EXPECT_TRUE(next.attempts().empty()) << "a restart doesn't shorten it";
-    next.advance(2min);
-    EXPECT_EQ(next.attempts().size(), 1u);
+    next.advance(1h + 2min);
+    EXPECT_EQ(next.attempts().size(), 1u) << "two hours, and up to half as much";
 }
 
 TEST_F(BackgroundSessionTest, SoManyAtOnceAndInTheirOrder)
