@@ -231,7 +231,7 @@ void DownloadManager::_addResource(const std::string& identifier, const std::opt
     }
     const std::uint64_t timer = ++_lastTimer;
     _pending.emplace(identifier, Pending{*url, timer});
-    _queue->after(_delay(), [weak = weak_from_this(), identifier, timer] {
+    _queue->after(_configuredDelay().value_or(kDownloadDelay), [weak = weak_from_this(), identifier, timer] {
         if (const auto self = weak.lock()) self->_startPending(identifier, timer);
     });
 }
@@ -254,10 +254,12 @@ void DownloadManager::_downloadResource(const DownloadResource& resource, const 
     UrlRequest request = _createDownloadRequest(resource, url);
     log(kLogDownloadManager)
         .log("starting download of {} reason: {} delay: {:f} headers: {}", url.string(), reason,
-             platform::toSeconds(_delay()), platform::Private{textOf(request.headers)}); // may reveal the location
+             platform::toSeconds(_configuredDelay().value_or(kDownloadDelay)),
+             platform::Private{textOf(request.headers)}); // may reveal the location
     const auto task = _assembly.downloadURLSession->downloadTask(std::move(request));
     if (!task) return log(kLogDownloadManager).error("download task error {}", task.error().description());
     (*task)->setNote(url.string()); // the request's URL has more query items
+    if (!_configuredDelay()) (*task)->setStartWindow(kDownloadWindow);
     (*task)->resume();
 }
 
@@ -280,10 +282,12 @@ std::string DownloadManager::_resourceVersion(const DownloadResource& resource) 
     return resource.url ? resource.url->queryValue("version").value_or("") : "";
 }
 
-platform::Duration DownloadManager::_delay() const
+/// Returns the delay of the user default; nothing if that is missing or invalid.
+std::optional<platform::Duration> DownloadManager::_configuredDelay() const
 {
-    const std::int64_t seconds = _assembly.userDefaults.integer(kDelayKey).value_or(kDownloadDelay.count());
-    return std::chrono::seconds(seconds >= 0 && seconds <= kLongestDelay ? seconds : kDownloadDelay.count());
+    const auto seconds = _assembly.userDefaults.integer(kDelayKey);
+    if (!seconds || *seconds < 0 || *seconds > kLongestDelay) return std::nullopt;
+    return std::chrono::seconds(*seconds);
 }
 
 bool DownloadManager::_isAllowed(const std::string& identifier) const

@@ -34,6 +34,9 @@ inline constexpr const char* TAVFileDeletedNotification = "TAVFileDeletedNotific
 
 /// From a new bag to the download of the resources that it changes.
 inline constexpr std::chrono::seconds kDownloadDelay{60};
+/// Each download then starts at a random time within this, so that a bag doesn't send all devices for a file at once.
+/// The next bag, which cancels downloads, is fetched later than that.
+inline constexpr std::chrono::hours kDownloadWindow{1};
 
 /// What the download manager needs to know about lookup hints. Implemented by the service that installs them. Any
 /// thread.
@@ -48,12 +51,12 @@ public:
 /// Keeps a local copy of each resource file that the bag lists.
 ///
 /// Each new bag cancels the running downloads and checks whether each resource needs a download (`downloadReason`). If
-/// so, the download starts 60 s later (or after the user default "TAVDownloadDelay", in seconds) if the reason still
-/// holds then; a bag that arrives before that updates the URL. The session carries out a download within a day, across
-/// restarts. A download of an earlier process continues until the first bag, which may be the one on disk; if it ends
-/// before that, its file is installed. Status 200 replaces the file atomically, and 304 keeps it. Only then is the
-/// resource's URL stored, so the next bag repeats a failed download. A resource that the bag no longer lists is
-/// deleted.
+/// so, the download is created 60 s later if the reason still holds then, and starts within `kDownloadWindow`; with the
+/// user default "TAVDownloadDelay", in seconds, it starts after exactly that. A bag that arrives before its creation
+/// updates the URL. The session carries out a download within a day, across restarts. A download of an earlier process
+/// continues until the first bag, which may be the one on disk; if it ends before that, its file is installed. Status
+/// 200 replaces the file atomically, and 304 keeps it. Only then is the resource's URL stored, so the next bag repeats
+/// a failed download. A resource that the bag no longer lists is deleted.
 ///
 /// Any thread.
 class DownloadManager : public platform::BackgroundSessionDelegate,
@@ -117,7 +120,7 @@ private:
     [[nodiscard]] platform::UrlRequest _createDownloadRequest(const DownloadResource& resource,
                                                               const platform::Url& url) const;
     [[nodiscard]] std::string _resourceVersion(const DownloadResource& resource) const;
-    [[nodiscard]] platform::Duration _delay() const;
+    [[nodiscard]] std::optional<platform::Duration> _configuredDelay() const;
     [[nodiscard]] bool _isAllowed(const std::string& identifier) const;
     [[nodiscard]] bool _fileExists(const std::string& identifier) const;
     [[nodiscard]] platform::Result<std::filesystem::path> _pathToResource(const std::string& identifier) const;

@@ -63,6 +63,7 @@ struct FakeLookup final : LookupResources {
 struct DownloadManagerTest : test::AssemblyTest {
     DownloadManagerTest()
     {
+        device.userDefaults.set("TAVDownloadDelay", 60); // exactly, not at some time within the window
         assembly.requestFactory = TAVNetworkRequestFactory::make(assembly);
         makeManager();
     }
@@ -432,6 +433,16 @@ TEST_F(DownloadManagerTest, TheDelayCanBeShortenedForDevelopment)
     device.advance(1s);
     EXPECT_EQ(tasks().size(), 1u);
     EXPECT_TRUE(log.count("delay: 2.000000"));
+}
+
+TEST_F(DownloadManagerTest, DevicesStartADownloadAtDifferentTimes)
+{
+    device.userDefaults.set("TAVDownloadDelay", Value());
+    bag({{"TAVQIFeatures", "https://r.example/f"}});
+    device.advance(60s);
+    EXPECT_TRUE(tasks().empty());
+    device.advance(kDownloadWindow);
+    EXPECT_EQ(tasks().size(), 1u);
 }
 
 TEST_F(DownloadManagerTest, ServesResourcesAndNoOtherFiles)

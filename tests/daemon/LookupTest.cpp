@@ -15,7 +15,11 @@ using namespace std::chrono_literals;
 using platform::Url;
 
 struct LookupTest : DaemonTest {
-    LookupTest() { start(); }
+    LookupTest()
+    {
+        start();
+        device.userDefaults.set("TAVDownloadDelay", 60); // exactly, not at some time within the window
+    }
 
     /// The daemon's downloads, which the next bag starts.
     void offer(Dictionary resources)

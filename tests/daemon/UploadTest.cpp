@@ -102,6 +102,7 @@ TEST_F(UploadTest, EndsAreCounted)
 TEST_F(UploadTest, UploadsWaitAWeekOnAnyNetworkAndDownloadsADayForOneFreeOfCharge)
 {
     begin();
+    device.userDefaults.set("TAVDownloadDelay", 60);
     auto& loads = device.background.loads;
     const auto downloads = [&] { return loads.at("com.quorvane.tavrind")->tasks.size(); };
     const LogCapture log;
