@@ -122,20 +122,21 @@ Response responseOf(Answer answer, const Request& request)
     const Headers headers = answer.headers;
     const std::string type = answer.contentType;
     const bool hasBody = !answer.body.empty() || answer.more || answer.paddedTo > 0 || answer.cut;
-    bool packed = false;
+    bool packed = false, packable = false;
     Response response(nullptr, MHD_destroy_response);
     if (answer.more || answer.cut || answer.paddedTo > answer.body.size()) {
         response = streamed(std::move(answer));
     } else {
-        packed = answer.body.size() >= kPackedFrom && type == "application/json" &&
-                 !findHeader(headers, "Content-Encoding") &&
-                 headerOf(request.headers, "Accept-Encoding").find("gzip") != std::string::npos;
+        packable =
+            answer.body.size() >= kPackedFrom && type == "application/json" && !findHeader(headers, "Content-Encoding");
+        packed = packable && headerOf(request.headers, "Accept-Encoding").find("gzip") != std::string::npos;
         if (packed) answer.body = gzipPacked(answer.body);
         response.reset(MHD_create_response_from_buffer(answer.body.size(), answer.body.data(), MHD_RESPMEM_MUST_COPY));
     }
     if (!response) throw std::bad_alloc();
     if (hasBody) MHD_add_response_header(response.get(), "Content-Type", type.c_str());
     if (packed) MHD_add_response_header(response.get(), "Content-Encoding", "gzip");
+    if (packable) MHD_add_response_header(response.get(), "Vary", "Accept-Encoding"); // for caches in between
     for (const auto& [name, value] : headers) MHD_add_response_header(response.get(), name.c_str(), value.c_str());
     return response;
 }

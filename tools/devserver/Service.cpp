@@ -2,6 +2,8 @@
 
 #include <charconv>
 #include <chrono>
+#include <functional>
+#include <string_view>
 
 #include <fmt/format.h>
 
@@ -49,6 +51,16 @@ std::size_t numberIn(const Request& request, std::string_view name)
 bool isBelow(std::string_view path, std::string_view folder)
 {
     return path.starts_with(folder) && (path.size() == folder.size() || path[folder.size()] == '/');
+}
+
+/// Makes an answer one that caches may keep and revalidate. Returns 304 if the request has its tag.
+Answer cacheable(Answer answer, int seconds, const Request& request)
+{
+    const std::string tag = fmt::format("\"{:x}\"", std::hash<std::string_view>{}(answer.body));
+    answer.headers = {{"ETag", tag}, {"Cache-Control", fmt::format("max-age={}", seconds)}};
+    const std::string* atHand = findHeader(request.headers, "If-None-Match");
+    if (atHand && *atHand == tag) answer.status = 304;
+    return answer;
 }
 
 bool isSearch(std::string_view endpoint)
@@ -128,18 +140,12 @@ Answer Service::answerEndpoint(std::string_view endpoint, const Request& request
     if (endpoint == "upload") return errorAnswer(405, "feedback must be sent with POST");
     if (!get) return errorAnswer(405, "only GET and HEAD are allowed");
     if (isSearch(endpoint)) return answerSearch(endpoint, request);
-    if (endpoint == "bag") {
-        Answer answer = jsonAnswer(bag.document());
-        answer.headers.emplace_back("Cache-Control", "max-age=300");
-        return answer;
-    }
+    if (endpoint == "bag") return cacheable(jsonAnswer(bag.document()), 300, request);
     if (endpoint == "image") {
         const std::string identifier = platform::percentDecode(std::string_view(request.path).substr(kImages.size()));
         const std::size_t size = numberIn(request, "size");
         if (size > kMaximumImage) return errorAnswer(400, fmt::format("a size is {} bytes at most", kMaximumImage));
-        Answer answer{.contentType = "image/png", .body = imageFor(identifier, size)};
-        answer.headers.emplace_back("Cache-Control", "max-age=86400");
-        return answer;
+        return cacheable({.contentType = "image/png", .body = imageFor(identifier, size)}, 86400, request);
     }
     if (endpoint == "resource")
         return resourceAnswer(base, std::string_view(request.path).substr(kResources.size()), request);
