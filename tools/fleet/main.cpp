@@ -1,7 +1,10 @@
 // tavrin-fleet: simulates many devices with the daemon's own policies, and reports what a service sees of them.
 
+#include <algorithm>
+#include <cerrno>
 #include <cstdio>
 #include <cstdlib>
+#include <cstring>
 #include <optional>
 #include <sys/resource.h>
 #include <unistd.h>
