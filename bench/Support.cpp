@@ -115,7 +115,7 @@ std::vector<Row> callRows(const std::string& what, double limit, double daemon, 
         return Row{std::move(text), seconds(ours), seconds(beside), ours / beside, atMost, "×"};
     };
     return {row(what + ", beside a socket echo of as many bytes, on one core", daemon, echo, limit),
-            row("the same beside a server on sd-bus that only replies", daemon, server, kReportedOnly),
+            row(what + ", beside a server on sd-bus that only replies", daemon, server, kReportedOnly),
             row("that server beside the echo", server, echo, kReportedOnly)};
 }
 
