@@ -23,6 +23,9 @@ constexpr std::size_t kMaximumSuiteSize = 4u << 20;
 /// Number and interval of attempts to take a lock that another process holds.
 constexpr int kLockAttempts = 20;
 constexpr std::chrono::milliseconds kLockDelay(100);
+/// Delay of another attempt after the file could not be read or written; doubles up to the longest.
+constexpr Duration kFirstRetryDelay = std::chrono::seconds(1);
+constexpr Duration kLongestRetryDelay = std::chrono::minutes(1);
 } // namespace
 
 struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
@@ -35,7 +38,8 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
     Dictionary registered GUARDED_BY(mutex);
     std::set<std::string, std::less<>> dirty GUARDED_BY(mutex); // keys that were set and are not yet in the file
     bool writeQueued GUARDED_BY(mutex) = false;
-    bool fileIsBroken GUARDED_BY(mutex) = false;
+    bool againQueued GUARDED_BY(mutex) = false;
+    Duration againDelay GUARDED_BY(mutex) = kFirstRetryDelay;
     Mutex writing; // one reader or writer of the file at a time; taken before `mutex`
     std::unique_ptr<FileWatch> watch;
     int lockAttempts = 0;  // failed ones since the last write; write queue only, like the next
@@ -58,8 +62,13 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
     {
         MutexLock reader(writing); // a writer must not finish between the read and the assignment below
         auto contents = readFile();
+        if (!contents && mayPass(contents.error())) {
+            defaultLog().error("user defaults {} can't be read, trying again later: {}", path.string(),
+                               contents.error().description());
+            return againLater();
+        }
         MutexLock lock(mutex);
-        fileIsBroken = !contents;
+        if (dirty.empty()) againDelay = kFirstRetryDelay;
         if (!contents) {
             defaultLog().error("user defaults {} can't be read, defaults apply: {}", path.string(),
                                contents.error().description());
@@ -72,6 +81,24 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
                 contents->remove(key);
         }
         values = std::move(*contents);
+    }
+
+    /// Reads the file again after a while, and writes pending values.
+    void againLater()
+    {
+        MutexLock lock(mutex);
+        if (!writeQueue || std::exchange(againQueued, true)) return;
+        writeQueue->after(againDelay, [weak = weak_from_this()] {
+            const auto self = weak.lock();
+            if (!self) return;
+            {
+                MutexLock again(self->mutex);
+                self->againQueued = false;
+            }
+            self->load();
+            if (!self->retrying) self->writeSoon();
+        });
+        againDelay = std::min(2 * againDelay, kLongestRetryDelay);
     }
 
     enum class Lock { Needed, Wanted };
@@ -110,6 +137,7 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
                                lockFile.error().description());
 
         auto contents = readFile();
+        if (!contents && mayPass(contents.error())) return writeFailed(contents.error());
         if (!contents) keepAside();
         Dictionary merged = contents ? std::move(*contents) : Dictionary();
         std::set<std::string, std::less<>> written;
@@ -123,14 +151,16 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
                     merged.remove(key);
             }
             values = merged;
-            fileIsBroken = false;
         }
         const std::string text = toJson(merged, JsonStyle::Pretty) + "\n";
         const auto done = text.size() <= kMaximumSuiteSize ? files->writeAtomically(path, text)
                                                            : Result<void>(std::unexpected(Error::posix(EFBIG)));
+        {
+            MutexLock lock(mutex);
+            if (done) againDelay = kFirstRetryDelay;
+            if (!done) dirty.merge(written);
+        }
         if (done) return {};
-        MutexLock lock(mutex);
-        dirty.merge(written);
         return writeFailed(done.error());
     }
 
@@ -143,8 +173,9 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
             defaultLog().error("user defaults {} are damaged, kept as {}.corrupt", path.string(), path.string());
     }
 
-    Result<void> writeFailed(const Error& error) const
+    Result<void> writeFailed(const Error& error)
     {
+        againLater();
         defaultLog().error("user defaults {} can't be written: {}", path.string(), error.description());
         return std::unexpected(error);
     }

@@ -22,8 +22,10 @@ class RunLoop;
 /// Small persistent settings: one suite, one JSON file that maps keys to values. Any thread.
 ///
 /// A key has the file's value, else its registered default, else null. The file may be edited or replaced while the
-/// process runs; `watch` reads it again. If it can't be read or isn't a JSON object, the error is logged and the suite
-/// is empty until the file is replaced. The next write renames such a file to "NAME.corrupt".
+/// process runs; `watch` reads it again. If it isn't a JSON object or too large, the error is logged and the suite is
+/// empty until the file is replaced; the next write renames such a file to "NAME.corrupt". If a read or write fails
+/// for a reason that may pass, the values stay as they were, and both are tried again after a second, then twice as
+/// long, up to a minute.
 ///
 /// Readers see `set` at once. It is written soon, atomically, together with other keys set by then; keys that others
 /// changed in the file are kept. A kill may lose values that `synchronize` hasn't written.
@@ -56,7 +58,7 @@ public:
     /// Stores dates as seconds since 1970. Null removes the key.
     void set(std::string_view key, Value value);
     void remove(std::string_view key) { set(key, Value()); }
-    /// Writes pending values before it returns. Logs and returns a failure; the next write retries.
+    /// Writes pending values before it returns. Logs and returns a failure.
     Result<void> synchronize();
     /// Reads the file again.
     void reload();

@@ -1,5 +1,8 @@
 #include "platform/values/Error.h"
 
+#include <algorithm>
+#include <array>
+#include <cerrno>
 #include <system_error>
 
 #include <fmt/format.h>
@@ -32,6 +35,12 @@ std::string Error::description() const
 std::unexpected<Error> malformed(std::string reason)
 {
     return std::unexpected(Error::withReason(std::string(kFormatErrorDomain), kFormatMalformed, std::move(reason)));
+}
+
+bool mayPass(const Error& error)
+{
+    constexpr std::array kCodes{ENOSPC, EDQUOT, EROFS, EIO, EMFILE, ENFILE, ENOMEM};
+    return error.domain == kPosixErrorDomain && std::ranges::find(kCodes, error.code) != kCodes.end();
 }
 
 } // namespace platform

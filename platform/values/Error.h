@@ -51,5 +51,8 @@ inline constexpr std::int64_t kFormatUnknownClass = 2;
 [[nodiscard]] std::unexpected<Error> malformed(std::string reason);
 /// The domain of system call errors. Codes are `errno` values.
 inline constexpr std::string_view kPosixErrorDomain = "POSIX";
+/// Returns whether a system call failed because of the device or the process, so that it may succeed later: the disk is
+/// full, read-only or failed, too many files are open, memory is short.
+[[nodiscard]] bool mayPass(const Error& error);
 
 } // namespace platform

@@ -195,24 +195,33 @@ TEST_F(UserDefaultsTest, ALockThatAnotherProcessKeepsPutsAWriteOffButNotForEver)
     }
 }
 
-TEST_F(UserDefaultsTest, AWriteThatFailedIsTriedAgainWithTheNext)
+TEST_F(UserDefaultsTest, WhatFailedIsTriedAgain)
 {
-    for (const std::string operation : {"mkdir", "write"}) {
+    for (const std::string operation : {"read", "mkdir", "write"}) {
         test::MemoryFiles memory;
-        UserDefaults defaults(memory, "/nowhere/suite.json", queue);
-        memory.fault = [&](std::string_view asked, const fs::path&) { return asked == operation ? ENOSPC : 0; };
-        defaults.set("a", 1);
+        memory.files["/config/suite.json"] = R"({"theirs": 1})";
+        memory.fault = [&](std::string_view asked, const fs::path&) { return asked == operation ? EMFILE : 0; };
+        UserDefaults defaults(memory, "/config/suite.json", queue);
+        defaults.set("mine", 2);
         drain();
-        EXPECT_EQ(defaults.synchronize().error().code, ENOSPC);
-        EXPECT_EQ(defaults.integer("a"), 1) << "readers see it all the same";
-        EXPECT_TRUE(memory.files.empty());
+        EXPECT_EQ(defaults.synchronize().error().code, EMFILE);
+        EXPECT_EQ(defaults.integer("mine"), 2) << "readers see it all the same";
+        EXPECT_EQ(memory.files.size(), 1u) << operation << ": nothing is put aside";
+        for (int minute = 0; minute < 10; ++minute) advance(1min);
+        EXPECT_EQ(clock.pendingTimers(), 1u);
         memory.fault = nullptr;
-        defaults.set("b", 2);
-        drain();
-        ASSERT_TRUE(memory.files.contains("/nowhere/suite.json")) << operation;
-        EXPECT_EQ(parseJson(memory.files.at("/nowhere/suite.json"), 1 << 20), Value(Dictionary{{"a", 1}, {"b", 2}}));
+        defaults.reload();
+        EXPECT_EQ(defaults.integer("theirs"), 1);
+        memory.fault = [&](std::string_view asked, const fs::path&) { return asked == operation ? EMFILE : 0; };
+        defaults.reload();
+        EXPECT_EQ(defaults.integer("theirs"), 1) << operation << ": the last values apply";
+        memory.fault = nullptr;
+        advance(1min);
+        EXPECT_EQ(parseJson(memory.files.at("/config/suite.json"), 1 << 20),
+                  Value(Dictionary{{"theirs", 1}, {"mine", 2}}));
+        EXPECT_EQ(clock.pendingTimers(), 0u);
     }
-    EXPECT_EQ(log.count("can't be written"), 4);
+    EXPECT_LT(log.count("trying again later"), 20) << "less and less often";
 }
 
 } // namespace
