@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <functional>
 #include <string_view>
 #include <utility>
 
@@ -53,22 +54,26 @@ void FeedbackBooks::_load()
     if (!contents) {
         if (contents.error().code != ENOENT)
             log(kLogFeedback).error("feedback books not read: {}", contents.error().reason());
+        _unread = platform::mayPass(contents.error());
         return;
     }
+    _unread = false;
     const auto books = platform::parseJson(contents->view(), kMaximumFileSize);
     if (!books || !books->asDictionary())
         return log(kLogFeedback).error("feedback books are damaged, starting with empty ones");
 
+    std::array<std::int64_t, kFeedbackFates> read{};
     for (std::size_t fate = 0; fate < kFeedbackFates; ++fate) {
         const Value& group = fate < kFirstDropped ? *books : (*books)["dropped"];
         const std::int64_t events =
             std::clamp<std::int64_t>(group[kNames[fate]].asInt().value_or(0), 0, INT64_MAX / 64);
         _recorded += events;
-        _counts[fate] = events;
+        read[fate] = events;
     }
     for (const FeedbackFate underWay : {FeedbackFate::Open, FeedbackFate::Closed, FeedbackFate::Uploading})
-        _unresolved += std::exchange(_counts[at(underWay)], 0);
-    _counts[at(FeedbackFate::Unknown)] += _unresolved;
+        _unresolved += std::exchange(read[at(underWay)], 0);
+    read[at(FeedbackFate::Unknown)] += _unresolved;
+    std::ranges::transform(_counts, read, _counts.begin(), std::plus());
     if (const auto* settled = (*books)["settled"].asArray())
         for (const Value& upload : *settled)
             if (upload.asString()) _settled.push_back(*upload.asString());
@@ -120,6 +125,11 @@ bool FeedbackBooks::isSettled(const std::string& upload) const
 void FeedbackBooks::save()
 {
     const platform::MutexLock saving(_saving);
+    {
+        const platform::MutexLock lock(_mutex);
+        if (_unread) _load();
+        if (_unread) return; // what the file counts must not be overwritten
+    }
     Value books = description();
     {
         const platform::MutexLock lock(_mutex);

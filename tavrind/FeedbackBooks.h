@@ -53,7 +53,8 @@ inline constexpr std::size_t kFeedbackFates = static_cast<std::size_t>(FeedbackF
 /// Any thread.
 class FeedbackBooks {
 public:
-    /// Reads `path`; a damaged file is logged and replaced. `queue` (serial) runs `saveSoon`.
+    /// Reads `path`; a damaged file is logged and replaced. If reading fails for a reason that may pass, `save` tries
+    /// it again and adds the counts. `queue` (serial) runs `saveSoon`.
     FeedbackBooks(platform::FileSystem& files, std::filesystem::path path, std::shared_ptr<platform::Queue> queue);
 
     /// Records new events, which are at `fate` or were dropped because of it.
@@ -94,6 +95,7 @@ private:
     std::int64_t _unresolved GUARDED_BY(_mutex) = 0;     ///< unknown events that may still be found
     std::deque<std::string> _settled GUARDED_BY(_mutex); ///< uploads whose outcome is booked, the newest last
     bool _saveQueued GUARDED_BY(_mutex) = false;
+    bool _unread GUARDED_BY(_mutex) = false; ///< the file's counts are still to be added
     std::shared_ptr<platform::Queue> _queue;
     platform::Mutex _saving; // orders the writes: an older state never overwrites a newer one
 };

@@ -53,7 +53,8 @@ struct CounterStore::Impl : std::enable_shared_from_this<Impl> {
     mutable SharedMutex mutex;
     std::unordered_map<std::string, Counter, KeyHash, std::equal_to<>> counters GUARDED_BY(mutex);
     std::atomic<bool> writeQueued = false;
-    mutable Mutex writing; // orders writers: an older snapshot must not overwrite a newer one
+    Mutex writing;                           // orders writers: an older snapshot must not overwrite a newer one
+    bool unread GUARDED_BY(writing) = false; // the file's counts are still to be added
 
     /// Calls `change` with the counter's value; creates the counter if it is missing.
     template <class Change> void with(std::string_view key, Change change)
@@ -109,9 +110,11 @@ struct CounterStore::Impl : std::enable_shared_from_this<Impl> {
         return all;
     }
 
-    void write() const
+    void write()
     {
         const MutexLock writer(writing);
+        if (unread) load();
+        if (unread) return; // what the file counts must not be overwritten
         Dictionary contents;
         for (const auto& [key, count] : snapshot()) contents.set(key, count);
         auto made = files->createDirectories(path.parent_path());
@@ -119,9 +122,10 @@ struct CounterStore::Impl : std::enable_shared_from_this<Impl> {
         if (!written) defaultLog().error("counters can't be written: {}", written.error().description());
     }
 
-    void load()
+    void load() REQUIRES(writing)
     {
         auto bytes = files->read(path, kMaximumCountersSize);
+        unread = !bytes && mayPass(bytes.error());
         if (!bytes) {
             if (bytes.error().code != ENOENT)
                 defaultLog().error("counters can't be read: {}", bytes.error().description());
@@ -133,7 +137,8 @@ struct CounterStore::Impl : std::enable_shared_from_this<Impl> {
         MutexLock lock(mutex);
         for (const auto& [key, count] : *contents->asDictionary())
             if (const auto number = count.asInt(); number && counters.size() < kMaximumCounters)
-                counters.try_emplace(key, *number);
+                if (const auto [found, isNew] = counters.try_emplace(key, *number); !isNew)
+                    found->second.value += *number;
     }
 };
 
@@ -145,6 +150,7 @@ CounterStore::CounterStore(FileSystem& files, std::filesystem::path path, std::s
     _impl->files = &files;
     _impl->path = std::move(path);
     _impl->writeQueue = std::move(writeQueue);
+    const MutexLock loading(_impl->writing);
     _impl->load();
 }
 

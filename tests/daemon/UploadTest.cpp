@@ -447,6 +447,28 @@ TEST_F(UploadTest, DamagedBooksBeginAnew)
     }
 }
 
+TEST_F(UploadTest, BooksThatCannotBeReadAreAddedLater)
+{
+    begin();
+    const auto path = "/state/com.quorvane.tavrind/feedback-books.json";
+    device.files.directories.insert("/state/com.quorvane.tavrind");
+    device.files.files[path] = R"({"recorded": 9, "sent": 5, "closed": 1, "dropped": {"noBody": 3}})";
+    device.files.fault = [&](std::string_view operation, const auto& file) {
+        return operation == "read" && file == path ? EMFILE : 0;
+    };
+    restart();
+    appear();
+    flushSession();
+    upload();
+    EXPECT_EQ(booked(FeedbackFate::Sent), 0);
+    device.files.fault = nullptr;
+    upload();
+    EXPECT_EQ(booked(FeedbackFate::Sent), 5);
+    EXPECT_EQ(booked(FeedbackFate::NoBody), 3);
+    EXPECT_EQ(booked(FeedbackFate::Unknown), 1);
+    expectBooksClose();
+}
+
 // The stream
 
 TEST(DeflaterTest, EitherLibraryWritesAWholeStreamInSmallPieces)

@@ -1,5 +1,6 @@
 #include "platform/files/Counters.h"
 
+#include <map>
 #include <thread>
 
 #include <gtest/gtest.h>
@@ -95,16 +96,22 @@ TEST_F(CountersTest, HostileNamesFillNeitherMemoryNorFileAndEndNoOthersCounts)
     EXPECT_EQ(later.value("used"), 4) << "also after a restart";
 }
 
-TEST_F(CountersTest, AWriteThatFailedIsTriedAgain)
+TEST_F(CountersTest, WhatFailedIsTriedAgain)
 {
-    CounterStore counters(files, path, queue);
-    files.fault = [](std::string_view operation, const auto&) { return operation == "write" ? ENOSPC : 0; };
-    counters.add("a", 1);
-    advance(60s);
-    files.fault = nullptr;
-    counters.add("a", 1);
-    advance(60s);
-    EXPECT_EQ(CounterStore(files, path, queue).value("a"), 2);
+    for (const std::string failing : {"read", "write"}) {
+        files.files[path] = R"({"a": 5, "theirs": 1})";
+        files.fault = [&](std::string_view operation, const auto&) { return operation == failing ? EIO : 0; };
+        CounterStore counters(files, path, queue);
+        counters.add("a", 1);
+        advance(60s);
+        EXPECT_EQ(files.files[path], R"({"a": 5, "theirs": 1})") << failing;
+        files.fault = nullptr;
+        counters.add("a", 1);
+        advance(60s);
+        EXPECT_EQ(CounterStore(files, path, queue).snapshot(),
+                  (std::map<std::string, std::int64_t>{{"a", 7}, {"theirs", 1}}))
+            << failing;
+    }
 }
 
 TEST_F(CountersTest, OpenMetricsTextCannotBeBrokenByNames)
