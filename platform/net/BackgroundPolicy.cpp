@@ -31,7 +31,7 @@ Duration startDelay(Duration window, double jitter)
 
 bool isTransient(const Error& error)
 {
-    if (error.domain == kPosixErrorDomain) return error.code == ENOSPC || error.code == EDQUOT;
+    if (error.domain == kPosixErrorDomain) return mayPass(error);
     if (error.domain != kUrlErrorDomain) return false;
     constexpr std::array<std::int64_t, 6> kFinal{kUrlCancelled,        kUrlBadUrl,   kUrlUnsupported,
                                                  kUrlTooManyRedirects, kUrlTooLarge, kUrlForbiddenRedirect};

@@ -334,7 +334,8 @@ Result<FileHandle> BackgroundStore::openBody(const StoredTask& task) const
     const auto info = fileInfo(*file);
     if (!info) return std::unexpected(info.error());
     if (info->size != task.bodySize)
-        return std::unexpected(Error::withReason(std::string(kPosixErrorDomain), EIO, "the body was changed on disk"));
+        return std::unexpected(
+            Error::withReason(std::string(kPosixErrorDomain), EBADMSG, "the body was changed on disk"));
     return file;
 }
 

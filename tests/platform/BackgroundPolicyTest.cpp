@@ -40,8 +40,9 @@ TEST(BackgroundPolicy, OnlyWhatMayGetBetterIsTriedAgain)
     for (const auto code :
          {kUrlBadUrl, kUrlForbiddenRedirect, kUrlTooLarge, kUrlTooManyRedirects, kUrlUnsupported, kUrlCancelled})
         EXPECT_FALSE(better(kUrlErrorDomain, code)) << code;
-    for (const int full : {ENOSPC, EDQUOT}) EXPECT_TRUE(better(kPosixErrorDomain, full)) << full;
-    EXPECT_FALSE(better(kPosixErrorDomain, EIO) || better("other", 1));
+    for (const int code : {ENOSPC, EDQUOT, EROFS, EIO, EMFILE, ENOMEM})
+        EXPECT_TRUE(better(kPosixErrorDomain, code)) << code;
+    EXPECT_FALSE(better(kPosixErrorDomain, ENOENT) || better(kPosixErrorDomain, EBADMSG) || better("other", 1));
 }
 
 TEST(BackgroundPolicy, RetryAfterIsSecondsOrADate)

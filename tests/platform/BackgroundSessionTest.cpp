@@ -424,7 +424,7 @@ TEST_F(BackgroundSessionTest, ABodyThatWasChangedOnDiskIsNotSent)
     fs::resize_file(store() / "1.body", 3);
     Process next(root.path);
     EXPECT_TRUE(next.attempts().empty());
-    EXPECT_EQ(next.told(), (Told{fmt::format("1 0 {} note null", EIO), "all"}));
+    EXPECT_EQ(next.told(), (Told{fmt::format("1 0 {} note null", EBADMSG), "all"}));
 }
 
 // ---- waiting ----
