@@ -288,7 +288,7 @@ private:
     const std::shared_ptr<UrlSession> _loads;
 
     std::unique_ptr<BackgroundStore> _store;
-    std::optional<Error> _storeError; // why the store is missing
+    std::optional<Error> _storeError; // why the store is missing, or a temporary one
     Duration _storeRetry{};           // earliest time of the next attempt to open it
     LivedTime _time;
     std::map<std::uint64_t, Entry> _entries;
@@ -340,20 +340,22 @@ void Task::setStartWindow(Duration window)
 void Session::_openStore(bool make)
 {
     const fs::path directory = _environment.directory / folderName(_configuration.identifier);
-    if (_store || (!make && !BackgroundStore::exists(_environment.files, directory))) return;
+    const bool isTemporary = _store && _storeError;
+    if (_store && !(isTemporary && _entries.empty())) return;
+    if (!make && !BackgroundStore::exists(_environment.files, directory)) return;
     if (_storeError && _time.now() < _storeRetry) return;
     auto store = BackgroundStore::open(_environment.files, directory);
+    _storeError = store ? std::nullopt : std::optional(store.error());
     if (!store) {
-        const Error error = store.error();
-        defaultLog().error("background transfers can't be stored in {}: {}", directory.string(), error.description());
+        _storeRetry = _time.now() + kStoreRetryDelay;
+        defaultLog().error("background transfers can't be stored in {}: {}", directory.string(),
+                           _storeError->description());
+        if (isTemporary) return;
         store = BackgroundStore::openTemporary(_environment.files, _environment.temporary);
-        if (!store) {
-            _storeError = store.error();
-            _storeRetry = _time.now() + kStoreRetryDelay;
-        }
-        _tell([error](BackgroundSessionDelegate& delegate) { delegate.sessionDidBecomeInvalid(error); });
+        _tell([error = *_storeError](BackgroundSessionDelegate& delegate) { delegate.sessionDidBecomeInvalid(error); });
     }
     if (!store) return;
+    _leftOver.clear(); // of a temporary store
     _store = std::move(*store);
     _takeUp(_store->takeContents());
 }

@@ -55,8 +55,8 @@ public:
     /// The last task of the session has been reported.
     virtual void sessionDidFinishEvents() {}
     /// The session's store can't be opened, or another process has locked it. The session uses a temporary directory
-    /// instead; its tasks end with the process. If that fails too, creating a task fails; one that is created at least
-    /// a minute later tries to open the store again.
+    /// instead; its tasks end with the process. If that fails too, creating a task fails. A task that is created at
+    /// least a minute later tries to open the store again, unless the temporary directory has tasks.
     virtual void sessionDidBecomeInvalid(const Error&) {}
 };
 

@@ -307,7 +307,7 @@ TEST_F(BackgroundSessionTest, ADamagedStoreIsBegunAnew)
     EXPECT_EQ(log.count("are damaged, starting with an empty list"), 5) << "an empty file is a new store";
 }
 
-TEST_F(BackgroundSessionTest, WhereTheStoreCantBeUsedTasksWorkAndEndWithTheProcess)
+TEST_F(BackgroundSessionTest, WhileTheStoreCantBeUsedTasksWorkAndEndWithTheProcess)
 {
     fs::create_directory(root / "elsewhere");
     const std::pair<const char*, std::function<std::shared_ptr<void>()>> cases[]{
@@ -323,7 +323,7 @@ TEST_F(BackgroundSessionTest, WhereTheStoreCantBeUsedTasksWorkAndEndWithTheProce
     for (const auto& [name, spoil] : cases) {
         fs::remove_all(root / "transfers");
         fs::create_directory(root / "transfers");
-        const auto other = spoil();
+        auto other = spoil();
         if (other) (void)std::static_pointer_cast<Process>(other)->resumed("the other's");
         {
             Process process(root.path);
@@ -332,6 +332,15 @@ TEST_F(BackgroundSessionTest, WhereTheStoreCantBeUsedTasksWorkAndEndWithTheProce
             EXPECT_EQ(contentsOf(process.attempts()[0]->files.upload), "mine");
             process.answer(200);
             EXPECT_EQ(process.told(), (Told{"invalid POSIX", "1 200 0 note null", "all"})) << name;
+            (void)process.resumed("still temporary");
+            other.reset();
+            fs::remove_all(store());
+            process.advance(1min);
+            (void)process.resumed("beside the one that waits");
+            EXPECT_FALSE(fs::exists(store())) << name;
+            process.answerAll(200);
+            (void)process.resumed("stored");
+            EXPECT_EQ(bodies(), 1) << name;
         }
         EXPECT_TRUE(fs::is_empty(root / "elsewhere")) << name;
         for (const auto& entry : fs::directory_iterator(root.path))
