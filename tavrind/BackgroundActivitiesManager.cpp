@@ -115,7 +115,8 @@ void BackgroundActivitiesManager::_flusherActivity()
     _sweepBodies();
     for (const auto& container : _assembly.persistentStorage->getAvailableSessionHandles()) {
         const auto [session, lost, fate] = container->read();
-        _assembly.persistentStorage->deleteSessionWithFileContainer(container);
+        // If its file stays, the session must wait: uploaded now, it would be uploaded again after a restart.
+        if (!_assembly.persistentStorage->deleteSessionWithFileContainer(container)) continue;
         _assembly.feedbackBooks.move(FeedbackFate::Closed, fate, lost);
         if (!session) continue;
         // From here on, a kill loses this session but never sends it twice.

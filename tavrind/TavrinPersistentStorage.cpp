@@ -202,24 +202,26 @@ void TavrinPersistentStorage::closeSessionWithFileContainer(std::shared_ptr<File
     });
 }
 
-void TavrinPersistentStorage::deleteSessionWithFileContainer(std::shared_ptr<FileContainer> container)
+bool TavrinPersistentStorage::deleteSessionWithFileContainer(const std::shared_ptr<FileContainer>& container)
 {
-    _queue->async([self = shared_from_this(), container = std::move(container)] {
-        self->_fileCounts[index(container->use())] -= static_cast<int>(std::erase(self->_fileContainers, container));
+    return _queue->sync([&] {
         container->closeFile();
         const fs::path& fileUrl = container->fileUrl();
         if (fileUrl.empty())
-            return log(kLogFeedbackStorage)
+            log(kLogFeedbackStorage)
                 .error("Handle {} does not have a File URL", static_cast<const void*>(container.get()));
-        log(kLogFeedbackStorage).debug("delete file url {}", fileUrl.string());
-        if (const auto removed = self->_assembly.fileManager.remove(fileUrl); !removed)
-            log(kLogFeedbackStorage).error("File {} delete failed", fileUrl.string());
+        else
+            log(kLogFeedbackStorage).debug("delete file url {}", fileUrl.string());
+        const auto removed = fileUrl.empty() ? platform::Result<void>() : _assembly.fileManager.remove(fileUrl);
+        if (!removed) log(kLogFeedbackStorage).error("File {} delete failed", fileUrl.string());
+        if (!removed && platform::mayPass(removed.error())) return false;
+        _fileCounts[index(container->use())] -= static_cast<int>(std::erase(_fileContainers, container));
+        return true;
     });
 }
 
 void TavrinPersistentStorage::syncDeletions()
 {
-    _queue->sync([] {});
     if (const auto synced = _assembly.fileManager.syncDirectory(_cachesUrl); !synced)
         log(kLogFeedbackStorage).error("deleted session files may come back: {}", synced.error().description());
 }

@@ -218,6 +218,22 @@ TEST_F(UploadTest, SessionFilesAreBounded)
     EXPECT_EQ(created, 2000);
 }
 
+TEST_F(UploadTest, ASessionWhoseFileStaysWaits)
+{
+    begin();
+    appear();
+    flushSession();
+    device.files.fault = [](std::string_view operation, const std::filesystem::path& path) {
+        return operation == "remove" && path.filename().string().starts_with("session.") ? EROFS : 0;
+    };
+    upload();
+    EXPECT_TRUE(uploads().empty()) << "a restart would find the file, and send it again";
+    device.files.fault = nullptr;
+    upload();
+    EXPECT_EQ(uploads().size(), 1u);
+    expectBooksClose();
+}
+
 TEST_F(UploadTest, ADiskThatCannotBeSyncedLosesNoSession)
 {
     begin();
