@@ -32,8 +32,20 @@ constexpr std::chrono::seconds kEarliestStart = 300s;
 constexpr std::chrono::seconds kInterval = 600s;
 constexpr std::chrono::seconds kGracePeriod = 300s;
 constexpr std::size_t kMaximumPreview = 8u << 20; // bytes of compressed bodies in one answer
-/// Age at which the file of a body counts as abandoned: no body takes that long to write.
-constexpr std::chrono::hours kOldBody(1);
+/// Age at which an unfinished file counts as abandoned: none takes that long to write.
+constexpr std::chrono::hours kAbandoned(1);
+
+/// Returns whether `FileSystem` makes such names for files that will replace another: "NAME.0123ABCD.tmp".
+bool isReplacement(std::string_view name)
+{
+    constexpr std::string_view kSuffix = ".tmp";
+    constexpr std::size_t kDigits = 8;
+    if (!name.ends_with(kSuffix)) return false;
+    name.remove_suffix(kSuffix.size());
+    const std::size_t dot = name.rfind('.');
+    return dot != std::string_view::npos && name.size() - dot - 1 == kDigits &&
+           name.find_first_not_of("0123456789ABCDEF", dot + 1) == std::string_view::npos;
+}
 
 /// Sets the activity's state, and logs a refusal.
 void setState(ActivityState state, platform::Activity& activity)
@@ -112,7 +124,7 @@ void BackgroundActivitiesManager::insertFlushActivity(std::move_only_function<vo
 void BackgroundActivitiesManager::_flusherActivity()
 {
     _queueFlusher->assertOnQueue();
-    _sweepBodies();
+    _sweepUnfinished();
     for (const auto& container : _assembly.persistentStorage->getAvailableSessionHandles()) {
         const auto [session, lost, fate] = container->read();
         // If its file stays, the session must wait: uploaded now, it would be uploaded again after a restart.
@@ -160,19 +172,29 @@ void BackgroundActivitiesManager::previewUploads(platform::Reply<Value::Array> r
     });
 }
 
-/// Removes the bodies of processes that were killed while they wrote them: they hold users' events. A recent file
-/// stays: it may still be in use.
-void BackgroundActivitiesManager::_sweepBodies()
+/// Removes the files of processes that were killed while they wrote them: they hold users' events and settings. A
+/// recent file stays: it may still be in use.
+void BackgroundActivitiesManager::_sweepUnfinished()
 {
-    const std::filesystem::path& directory = _assembly.device.directories.temporary;
-    const platform::Date oldest = _assembly.device.clock.wallNow() - kOldBody;
-    for (const std::string& name : _assembly.fileManager.list(directory).value_or(std::vector<std::string>())) {
-        if (!isUploadBody(name)) continue;
-        const auto info = _assembly.fileManager.info(directory / name);
-        if (!info || info->kind != platform::FileInfo::Kind::File || info->modified > oldest) continue;
-        if (_assembly.fileManager.remove(directory / name))
-            log(kLogFlusher).log("removed the unfinished upload body {}", name);
-    }
+    constexpr const char* kDirectory = "com.quorvane.tavrind";
+    const platform::Directories& directories = _assembly.device.directories;
+    const platform::Date oldest = _assembly.device.clock.wallNow() - kAbandoned;
+    const std::pair<std::filesystem::path, bool (*)(std::string_view)> kinds[]{
+        {directories.temporary, isUploadBody},
+        {directories.caches / kDirectory, isReplacement},
+        {directories.state / kDirectory, isReplacement},
+        {directories.state / kDirectory / "privacy", isReplacement},
+        {directories.data / kDirectory / "data-detectors", isReplacement},
+        {directories.config,
+         [](std::string_view name) { return name.starts_with("com.quorvane.") && isReplacement(name); }}};
+    for (const auto& [directory, isOurs] : kinds)
+        for (const std::string& name : _assembly.fileManager.list(directory).value_or(std::vector<std::string>())) {
+            if (!isOurs(name)) continue;
+            const auto info = _assembly.fileManager.info(directory / name);
+            if (!info || info->kind != platform::FileInfo::Kind::File || info->modified > oldest) continue;
+            if (_assembly.fileManager.remove(directory / name))
+                log(kLogFlusher).log("removed the unfinished file {}", name);
+        }
 }
 
 void BackgroundActivitiesManager::_flushToWire(TavrinFeedbackFlusher& flusher)
@@ -183,7 +205,7 @@ void BackgroundActivitiesManager::_flushToWire(TavrinFeedbackFlusher& flusher)
 
 void BackgroundActivitiesManager::findUploads()
 {
-    _queueFlusher->async([self = shared_from_this()] { self->_sweepBodies(); });
+    _queueFlusher->async([self = shared_from_this()] { self->_sweepUnfinished(); });
     _assembly.uploadURLSession->getTasks(
         [weak = weak_from_this()](const std::vector<std::shared_ptr<platform::BackgroundTask>>& tasks) {
             const auto self = weak.lock();

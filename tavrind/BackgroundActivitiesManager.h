@@ -64,7 +64,7 @@ public:
 private:
     void _runActivity(const std::shared_ptr<platform::Activity>& activity);
     void _flusherActivity();
-    void _sweepBodies();
+    void _sweepUnfinished();
     void _flushToWire(TavrinFeedbackFlusher& flusher);
     void _findUpload(const platform::BackgroundTask& task);
 

@@ -385,15 +385,28 @@ TEST_F(UploadTest, FaultsOfTheDiskLoseOneSessionAndNothingElse)
     EXPECT_EQ(temporaryFiles(), 1u) << "of the body that could not be written";
 }
 
-TEST_F(UploadTest, BodiesThatAKilledProcessLeftAreSweptOnceTheyAreOld)
+TEST_F(UploadTest, WhatAKilledProcessLeftUnfinishedIsSweptOnceItIsOld)
 {
     begin();
     for (const char* name : {"flusher_123abc", "other"}) device.files.files[std::filesystem::path("/tmp") / name] = "x";
+    const std::filesystem::path kept[]{"/config/other.json.0123ABCD.tmp", "/state/com.quorvane.tavrind/a.tmp",
+                                       "/state/com.quorvane.tavrind/a.123.tmp"};
+    const std::filesystem::path swept[]{"/config/com.quorvane.tavrind.json.0123ABCD.tmp",
+                                        "/caches/com.quorvane.tavrind/bag.plist.0123ABCD.tmp",
+                                        "/state/com.quorvane.tavrind/privacy/ledger.FFFFFFFF.tmp"};
+    for (const auto& path : kept) device.files.files[path] = "x";
+    for (const auto& path : swept) {
+        device.files.directories.insert(path.parent_path());
+        device.files.files[path] = "x";
+    }
     restart();
+    for (const auto& path : swept) EXPECT_TRUE(device.files.files.contains(path)) << path;
     EXPECT_EQ(temporaryFiles(), 2u) << "another process may be making it";
     device.advance(1h);
     upload();
     EXPECT_EQ(temporaryFiles(), 1u) << "with the next pass";
+    for (const auto& path : kept) EXPECT_TRUE(device.files.files.contains(path)) << path;
+    for (const auto& path : swept) EXPECT_FALSE(device.files.files.contains(path)) << path;
     device.files.files["/tmp/flusher_123abc"] = "x";
     restart();
     EXPECT_FALSE(device.files.files.contains("/tmp/flusher_123abc")) << "and at the start";
