@@ -407,7 +407,7 @@ void BusConnection::takeMessage(sd_bus_message* message)
                     ? CallError{SD_BUS_ERROR_UNKNOWN_METHOD, fmt::format("there is no method {}", name)}
                     : CallError{SD_BUS_ERROR_UNKNOWN_INTERFACE, fmt::format("there is no interface {}", interface)};
     }
-    if (BusMessage answer = makeErrorAnswer(message, error)) send(answer.get(), error.message.size());
+    send(makeErrorAnswer(message, error).get(), error.message.size());
 }
 
 void BusConnection::receive(sd_bus_message* message, const Member& member)
@@ -421,9 +421,7 @@ void BusConnection::receive(sd_bus_message* message, const Member& member)
             .message = fmt::format("{} takes \"{}\", not \"{}\"", member.name, member.in, signature ? signature : "")});
     if (!decoded) {
         kLog.info("call {} of process {} refused: {}", member.name, _peer.pid, decoded.error().message);
-        if (BusMessage answer = makeErrorAnswer(message, decoded.error()))
-            send(answer.get(), decoded.error().message.size());
-        return;
+        return send(makeErrorAnswer(message, decoded.error()).get(), decoded.error().message.size());
     }
     // The message is kept, with its body, until the reply.
     const std::size_t size = _receiving / (1 + kDecodedShare) + decoded->size + kMessageOverhead;
@@ -464,7 +462,7 @@ void BusConnection::answer(std::uint64_t id, CallResult result, std::size_t size
     const auto call = _calls.find(id);
     if (call == _calls.end()) return;
     if (sd_bus_message_get_expect_reply(call->second.message.get()) > 0)
-        if (BusMessage answer = encodeAnswer(call->second, std::move(result))) send(answer.get(), size);
+        send(encodeAnswer(call->second, std::move(result)).get(), size);
     forget(id);
 }
 
@@ -501,18 +499,17 @@ BusMessage BusConnection::encodeAnswer(const PendingCall& call, CallResult resul
     return makeErrorAnswer(call.message.get(), result.error());
 }
 
+/// Sends a message, which is null if it could not be created. The peer must not wait for ever for a reply that is lost,
+/// so a failure ends the connection.
 void BusConnection::send(sd_bus_message* message, std::size_t size)
 {
     if (_state != State::Open || _peerGone) return;
     if (_messageDue && peerHasGone()) return; // if the write failed, the part that sd-bus has read would be lost
+    if (!message) return end("out of memory");
     sd_bus_message_set_sender(message, kOwnName);
     if (!sd_bus_message_get_destination(message)) sd_bus_message_set_destination(message, kPeerName);
     const int result = sd_bus_send(_bus.get(), message, nullptr);
-    if (result < 0 && !isDisconnect(result)) {
-        kLog.error("a message to process {} can't be sent: {}", _peer.pid, std::strerror(-result));
-        return;
-    }
-    if (result < 0) return driveAgain();
+    if (result < 0) return isDisconnect(result) ? driveAgain() : end(describe(result));
     settleWriteQueue(size + kMessageOverhead);
     if (_unwritten.size() > 1 && _unwrittenBytes > _context->limits.queuedBytes) endUnread("it doesn't read");
 }
