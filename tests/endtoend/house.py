@@ -7,6 +7,7 @@ import os
 import pathlib
 import re
 import signal
+import struct
 import subprocess
 import sys
 import tempfile
@@ -31,6 +32,18 @@ class Failure(Exception):
 def check(holds, what):
     if not holds:
         raise Failure(what)
+
+
+def whole_records(path):
+    """The complete records of a session file."""
+    data, at, records = path.read_bytes(), 0, []
+    while at + 8 < len(data):
+        (length,) = struct.unpack_from("=Q", data, at)
+        if length == 0 or at + 8 + length > len(data):
+            break
+        records.append(data[at + 8:at + 8 + length])
+        at += 8 + length
+    return records
 
 
 class Log:
@@ -70,7 +83,7 @@ class House:
         self.daemon, self.daemon_options = None, ["--check-queues"]
         self.passed_on = "XDG_|SSL_|TMPDIR|.*SAN_OPTIONS"  # the daemon's part of the environment
         self.filtered = False  # True: a system call that the daemon's unit refuses ends it
-        self.wrapper = []  # the words of a command that runs the daemon
+        self.wrapper, self.program = [], TAVRIND  # the words of a command that runs the daemon, and the daemon
         self.others = []  # processes that a case starts, and that end with the house
         self.service = subprocess.Popen([DEVSERVER, "--http-port", "0", "--https-port", "0", "--cert-dir",
                                          self.home / "certificate", "--quiet"], stdout=subprocess.PIPE,
@@ -94,7 +107,7 @@ class House:
         """Holds the socket, as systemd's socket units do; the daemon starts with its first client."""
         self.socket().parent.mkdir(mode=0o700, exist_ok=True)
         passed_on = [f"-E{name}" for name in self.environment if re.match(self.passed_on, name)]
-        program = [*self.wrapper, FILTERED, TAVRIND] if self.filtered else [*self.wrapper, TAVRIND]
+        program = [*self.wrapper, *([FILTERED] if self.filtered else []), self.program]
         self.daemon = subprocess.Popen(["systemd-socket-activate", f"--listen={self.socket()}", *passed_on,
                                         *program, "--log-level", log_level, *self.daemon_options],
                                        env=self.environment, stderr=subprocess.PIPE)
