@@ -248,12 +248,13 @@ void examine(const Options& options)
             printLine(finding.severity == Severity::Fine ? line : bold(line));
             if (!finding.advice.empty()) printLine(fmt::format("{:16}{}", "", finding.advice));
         }
-        const auto count = [&](Severity severity) {
-            return std::ranges::count(findings, severity, &Finding::severity);
+        const auto count = [&](Severity severity, std::string_view name) {
+            const auto number = std::ranges::count(findings, severity, &Finding::severity);
+            return fmt::format("{} {}{}", number, name, number == 1 ? "" : "s");
         };
         printLine(status == 0
                       ? "Everything is in order."
-                      : fmt::format("{} errors, {} warnings.", count(Severity::Error), count(Severity::Warning)));
+                      : fmt::format("{}, {}.", count(Severity::Error, "error"), count(Severity::Warning, "warning")));
     }
     if (status != 0) throw Failure("", status);
 }
