@@ -15,21 +15,12 @@ using platform::Value;
 
 namespace {
 
-/// An array or dictionary that is being searched, and the position of the search. Elements have no key.
+/// An array or dictionary that is being searched, and the position of the search. Scalars in it are no images.
 struct Level {
-    std::vector<std::pair<std::string_view, JsonView>> entries;
+    std::vector<std::pair<std::string_view, JsonView>> containers;
     bool hasKeys = false;
     std::size_t next = 0;
 };
-
-std::optional<Level> levelOf(JsonView value)
-{
-    if (value.isDictionary()) return Level{.entries = value.entries(), .hasKeys = true};
-    if (!value.isArray()) return std::nullopt;
-    Level level;
-    for (const JsonView element : value.elements()) level.entries.emplace_back("", element);
-    return level;
-}
 
 } // namespace
 
@@ -48,16 +39,17 @@ void enumerateImagesInResponse(JsonView object, const std::function<void(JsonVie
 {
     std::vector<Level> levels;
     const auto enter = [&levels](JsonView value) {
-        if (auto level = levelOf(value)) levels.push_back(std::move(*level));
+        if (auto containers = value.containers(); !containers.empty())
+            levels.push_back({.containers = std::move(containers), .hasKeys = value.isDictionary()});
     };
     enter(object);
     while (!levels.empty()) {
         Level& level = levels.back();
-        if (level.next == level.entries.size()) {
+        if (level.next == level.containers.size()) {
             levels.pop_back();
             continue;
         }
-        const auto [key, value] = level.entries[level.next++];
+        const auto [key, value] = level.containers[level.next++];
         if (!level.hasKeys || !keys.contains(key))
             enter(value);
         else if (value.isDictionary())

@@ -173,6 +173,11 @@ std::vector<dom::key_value_pair> entriesOf(dom::object object)
     return entries;
 }
 
+bool isContainer(dom::element element)
+{
+    return element.is_array() || element.is_object();
+}
+
 Value convert(dom::element element);
 
 Value convertArray(dom::array array)
@@ -408,12 +413,18 @@ std::vector<JsonView> JsonView::elements() const
     return elements;
 }
 
-std::vector<std::pair<std::string_view, JsonView>> JsonView::entries() const
+std::vector<std::pair<std::string_view, JsonView>> JsonView::containers() const
 {
-    std::vector<std::pair<std::string_view, JsonView>> entries;
-    if (const auto object = Access::get<dom::object>(*this))
-        for (const auto& [key, element] : entriesOf(*object)) entries.emplace_back(key, Access::viewOf(element));
-    return entries;
+    std::vector<std::pair<std::string_view, JsonView>> containers;
+    const auto add = [&containers](std::string_view key, dom::element element) {
+        if (isContainer(element)) containers.emplace_back(key, Access::viewOf(element));
+    };
+    if (const auto array = Access::get<dom::array>(*this))
+        for (const dom::element element : *array) add("", element);
+    const auto object = Access::get<dom::object>(*this);
+    if (object && std::ranges::any_of(*object, [](const auto& entry) { return isContainer(entry.value); }))
+        for (const auto& [key, element] : entriesOf(*object)) add(key, element);
+    return containers;
 }
 
 void JsonView::eachEntry(const std::function<void(std::string_view, JsonView)>& take) const

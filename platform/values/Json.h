@@ -48,11 +48,11 @@ public:
     [[nodiscard]] bool has(std::string_view key) const;
     /// Returns the elements of an array; nothing for a value of another type.
     [[nodiscard]] std::vector<JsonView> elements() const;
-    /// Returns the entries of a dictionary, the last of duplicates at the place of the first, as `value` has them;
-    /// nothing for a value of another type.
-    [[nodiscard]] std::vector<std::pair<std::string_view, JsonView>> entries() const;
-    /// Calls `take` for each entry of a dictionary in the document's order, and once for each duplicate. Takes less
-    /// time than `entries`.
+    /// Returns the entries of a dictionary that are themselves dictionaries or arrays, as `value` has them: the last of
+    /// duplicates at the place of the first. Of an array, returns such elements, with empty keys. Nothing for a value
+    /// of another type. Takes little time if there are few.
+    [[nodiscard]] std::vector<std::pair<std::string_view, JsonView>> containers() const;
+    /// Calls `take` for each entry of a dictionary in the document's order, and once for each duplicate.
     void eachEntry(const std::function<void(std::string_view key, JsonView entry)>& take) const;
 
     [[nodiscard]] Value value() const;

@@ -69,6 +69,8 @@ TEST(ResponseImages, StandUnderTheirRoles)
         {"[]", {}},
         {"3", {}},
         {R"({"icon": {"id": "a"}, "icon": {"id": "b"}})", {R"({"id":"b"})"}},
+        {R"({"icon": {"id": "a"}, "glyph": {"id": "c"}, "icon": 3})", {R"({"id":"c"})"}},
+        {R"({"icon": 3, "glyph": {"id": "c"}, "icon": {"id": "a"}})", {R"({"id":"a"})", R"({"id":"c"})"}},
     };
     for (const auto& c : cases) EXPECT_EQ(names(c.response), c.found) << c.response;
     enumerateImagesInResponse(JsonView(), [](JsonView) { FAIL(); });
