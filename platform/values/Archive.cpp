@@ -147,7 +147,11 @@ private:
 class ArchiveDecoder final : public Decoder {
 public:
     /// `archive` must outlive the decoder.
-    ArchiveDecoder(std::string_view archive, const RecordClasses& classes) : Decoder(classes), _tokens(archive) {}
+    ArchiveDecoder(std::string_view archive, const RecordClasses& classes) : Decoder(classes), _tokens(archive)
+    {
+        constexpr std::size_t kUsualDepth = 16; // one allocation instead of one for each doubling
+        _left.reserve(kUsualDepth);
+    }
 
     /// Fails unless the whole archive was read.
     void finish()
