@@ -22,6 +22,8 @@ constexpr std::size_t kMaximumHeaderSize = 256u << 10;
 
 /// The largest receive buffer that libcurl allows. Memory is only used for what is received.
 constexpr std::size_t kLargestBuffer = CURL_MAX_READ_SIZE;
+/// Receive buffer over HTTP/1.1: an ordinary answer takes one or two reads. libcurl polls before each.
+constexpr std::size_t kOrdinaryBuffer = 64u << 10;
 
 } // namespace
 
@@ -119,8 +121,9 @@ void CurlLoad::setOptions()
     // an end of a response included, until the connection has more data. The buffer must hold a whole response.
     const bool mayUseHttp2 = _hop.url.scheme() == "https" && !hasUpload() && maximumSize() <= kLargestBuffer;
     set(CURLOPT_HTTP_VERSION, static_cast<long>(mayUseHttp2 ? CURL_HTTP_VERSION_2TLS : CURL_HTTP_VERSION_1_1));
-    if (mayUseHttp2)
-        set(CURLOPT_BUFFERSIZE, static_cast<long>(std::min(maximumSize() + kMaximumHeaderSize, kLargestBuffer)));
+    const std::size_t buffer =
+        mayUseHttp2 ? std::min(maximumSize() + kMaximumHeaderSize, kLargestBuffer) : kOrdinaryBuffer;
+    set(CURLOPT_BUFFERSIZE, static_cast<long>(buffer));
     // Over plain HTTP libcurl would delay every request until the first response.
     set(CURLOPT_PIPEWAIT, _configuration.pipelining && _files && _hop.url.scheme() == "https" ? 1L : 0L);
     set(CURLOPT_FRESH_CONNECT, _fresh ? 1L : 0L);
