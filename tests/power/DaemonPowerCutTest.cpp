@@ -35,7 +35,11 @@ struct DaemonOnDisk final : FeedbackTest {
             ->respond(200, fmt::format("contents of version {}", version));
         device.drain();
     }
-    std::string bagVersion() { return assembly().bagController->currentBag()->version(); }
+    std::string bagVersion()
+    {
+        const auto bag = assembly().bagController->currentBag();
+        return bag ? bag->version() : "damaged";
+    }
 };
 
 /// What the life of a daemon promised, by numbers of calls of the disk.
@@ -89,6 +93,7 @@ Promises live(const platform::test::RecordedDisk& disk, platform::FileSystem& fi
         made.sent.push_back({std::to_string(daemon.booked(FeedbackFate::Sent)), begun, disk.calls()});
     };
 
+    daemon.device.userDefaults.set("TAVDownloadDelay", 60); // exactly, not at some time within the window
     changes(made.bag, "9", [&] { changes(made.sent, "", [&] { daemon.begin(); }); });
     made.sent.back().value = std::to_string(daemon.booked(FeedbackFate::Sent));
     report("event-a");
