@@ -61,6 +61,7 @@ private:
     WorkerPool& _pool;
     const std::shared_ptr<Queue> _queue;
     CURLM* const _multi;
+    CURLSH* const _tlsSessions; // of all handles; used on the queue only, so it needs no lock
     std::map<curl_socket_t, std::unique_ptr<WorkerPool::Source>> _sockets;
     const FileHandle _timerFd;
     std::unique_ptr<WorkerPool::Source> _timer; // from the first load
@@ -158,8 +159,10 @@ Loader::Loader(WorkerPool& pool, Clock& clock)
     : _pool(pool),
       // Of high priority: a request is sent before the work that its client's call left behind.
       _queue(Queue::make("url-loader", Queue::Kind::Serial, pool, clock, Rank::Root, Priority::High)),
-      _multi(curl_multi_init()), _timerFd(timerfd_create(CLOCK_MONOTONIC, TFD_CLOEXEC | TFD_NONBLOCK))
+      _multi(curl_multi_init()), _tlsSessions(curl_share_init()),
+      _timerFd(timerfd_create(CLOCK_MONOTONIC, TFD_CLOEXEC | TFD_NONBLOCK))
 {
+    curl_share_setopt(_tlsSessions, CURLSHOPT_SHARE, CURL_LOCK_DATA_SSL_SESSION);
     curl_multi_setopt(_multi, CURLMOPT_MAXCONNECTS, kIdleConnections);
     curl_multi_setopt(_multi, CURLMOPT_SOCKETDATA, this);
     curl_multi_setopt(
@@ -201,6 +204,7 @@ void Loader::stop()
         _stopped = true;
         while (!_active.empty()) end(_active.begin()->first, CURLE_OK, true);
         curl_multi_cleanup(_multi); // ends the watch of each socket
+        curl_share_cleanup(_tlsSessions);
         _timer.reset();
         stopped.set_value();
     });
@@ -220,7 +224,8 @@ void Loader::begin(const std::shared_ptr<CurlTask>& task)
 void Loader::send(const std::shared_ptr<CurlTask>& task)
 {
     CURL* easy = curl_easy_init();
-    if (easy && task->load->prepare(easy) && curl_multi_add_handle(_multi, easy) == CURLM_OK) {
+    if (easy && curl_easy_setopt(easy, CURLOPT_SHARE, _tlsSessions) == CURLE_OK && task->load->prepare(easy) &&
+        curl_multi_add_handle(_multi, easy) == CURLM_OK) {
         _active.emplace(easy, task);
         return;
     }
