@@ -47,7 +47,6 @@ platform::UrlSessionConfiguration foregroundConfiguration(const Assembly& assemb
                 .directory = device.directories.caches / "com.quorvane.tavrind" / "http",
                 .files = &device.files,
                 .queue = device.serialQueue("com.quorvane.tavrind.httpCache", rank::kContext),
-                .writer = device.globalQueue(platform::Priority::Background),
                 .clock = &device.clock}};
 }
 

@@ -1,9 +1,6 @@
 #include "platform/net/HttpCache.h"
 
-#include <cstdint>
-#include <deque>
 #include <list>
-#include <optional>
 #include <string>
 #include <string_view>
 #include <unordered_map>
@@ -97,9 +94,8 @@ private:
 
 } // namespace
 
-/// The disk is changed and read in the order of the calls. Changes wait for the writer, whose priority is low; a read
-/// doesn't wait for it, but makes the changes before it first. Memory is newer than the disk while changes are pending,
-/// so an entry with a pending change is not copied from disk to memory.
+/// Changes of the disk run in the order of the calls: each is queued under the mutex. Memory is newer than the disk
+/// while changes are pending, so an entry with a pending change is not copied from disk to memory.
 struct HttpCache::Impl : std::enable_shared_from_this<Impl> {
     explicit Impl(HttpCacheConfiguration configuration_)
         : configuration(std::move(configuration_)), memory(configuration.memoryCapacity)
@@ -108,20 +104,16 @@ struct HttpCache::Impl : std::enable_shared_from_this<Impl> {
     Stored find(const Url& url)
     {
         const std::string key = cacheKey(url);
-        Stored stored;
-        const auto earlier = needsDisk(key, stored);
-        return earlier ? configuration.queue->sync([&] { return readFromDisk(key, url, *earlier); }) : stored;
+        if (Stored stored; decidedWithoutDisk(key, stored)) return stored;
+        return configuration.queue->sync([&] { return readFromDisk(key, url); });
     }
 
     void lookUp(const Url& url, Found found)
     {
         std::string key = cacheKey(url);
-        Stored stored;
-        const auto earlier = needsDisk(key, stored);
-        if (!earlier) return found(std::move(stored));
-        configuration.queue->async(
-            [self = shared_from_this(), key = std::move(key), url, earlier = *earlier,
-             found = std::move(found)]() mutable { found(self->readFromDisk(key, url, earlier)); });
+        if (Stored stored; decidedWithoutDisk(key, stored)) return found(std::move(stored));
+        configuration.queue->async([self = shared_from_this(), key = std::move(key), url,
+                                    found = std::move(found)]() mutable { found(self->readFromDisk(key, url)); });
     }
 
     void put(std::string key, StoredResponse stored)
@@ -134,7 +126,7 @@ struct HttpCache::Impl : std::enable_shared_from_this<Impl> {
         const std::size_t size = sizeOf(key, *shared);
         if (shared->body.size() > configuration.diskCapacity / kLargestPart || waitingBytes + size > kMostWaiting)
             return removeLater(std::move(key));
-        change(hash(key), size, [this, key, shared] { writeToDisk(key, *shared); });
+        change(hash(key), size, [self = shared_from_this(), key, shared] { self->writeToDisk(key, *shared); });
     }
 
     void remove(std::string key)
@@ -147,12 +139,6 @@ struct HttpCache::Impl : std::enable_shared_from_this<Impl> {
     const HttpCacheConfiguration configuration;
 
 private:
-    struct Change {
-        std::size_t keyHash;
-        std::size_t bytes;
-        Queue::Task work; ///< doesn't own the cache, which owns it
-    };
-
     [[nodiscard]] bool hasDisk() const { return configuration.files && !configuration.directory.empty(); }
     [[nodiscard]] static std::size_t hash(const std::string& key) { return std::hash<std::string>()(key); }
 
@@ -161,24 +147,23 @@ private:
     {
         return !onDisk || onDisk->contains(hash(key)) || changing.contains(hash(key));
     }
-    /// Queues a change of the disk. `keyHash` is the hash of its key; the change holds `bytes` until it is made.
+    /// Queues a change of the disk. `keyHash` is the hash of its key; the change holds `bytes` until it is done.
     void change(std::size_t keyHash, std::size_t bytes, Queue::Task work) REQUIRES(mutex)
     {
         changing.insert(keyHash);
         waitingBytes += bytes;
-        ++queued;
-        changes.push_back({keyHash, bytes, std::move(work)});
-        if (configuration.writer)
-            configuration.writer->async(
-                [self = shared_from_this()] { self->configuration.queue->sync([&] { self->makeChange(); }); });
-        else
-            configuration.queue->async([self = shared_from_this()] { self->makeChange(); });
+        configuration.queue->async([self = shared_from_this(), keyHash, bytes, work = std::move(work)]() mutable {
+            work();
+            MutexLock lock(self->mutex);
+            self->changing.erase(self->changing.find(keyHash));
+            self->waitingBytes -= bytes;
+        });
     }
     void removeLater(std::string key) REQUIRES(mutex)
     {
         if (!mayBeOnDisk(key)) return;
         const std::size_t keyHash = hash(key);
-        change(keyHash, 0, [this, key = std::move(key)] { removeFromDisk(key); });
+        change(keyHash, 0, [self = shared_from_this(), key = std::move(key)] { self->removeFromDisk(key); });
     }
     void forgetOnDisk(const std::string& key) REQUIRES(mutex)
     {
@@ -187,37 +172,18 @@ private:
 
     // Any thread.
 
-    /// If the disk must be read, returns the number of changes to make before; otherwise sets `stored` to the result.
-    [[nodiscard]] std::optional<std::uint64_t> needsDisk(const std::string& key, Stored& stored)
+    /// Returns true if the disk need not be read; `stored` is then the result.
+    [[nodiscard]] bool decidedWithoutDisk(const std::string& key, Stored& stored)
     {
         MutexLock lock(mutex);
         stored = memory.find(key);
-        return stored || !hasDisk() || !mayBeOnDisk(key) ? std::nullopt : std::optional(queued);
+        return stored || !hasDisk() || !mayBeOnDisk(key);
     }
 
     // On the queue.
 
-    /// Makes the oldest pending change; does nothing if a reader has made it.
-    void makeChange()
+    [[nodiscard]] Stored readFromDisk(const std::string& key, const Url& url)
     {
-        std::optional<Change> next;
-        {
-            MutexLock lock(mutex);
-            if (changes.empty()) return;
-            next = std::move(changes.front());
-            changes.pop_front();
-        }
-        next->work();
-        ++made;
-        MutexLock lock(mutex);
-        changing.erase(changing.find(next->keyHash));
-        waitingBytes -= next->bytes;
-    }
-
-    /// `earlier` is the number of changes before the read.
-    [[nodiscard]] Stored readFromDisk(const std::string& key, const Url& url, std::uint64_t earlier)
-    {
-        while (made < earlier) makeChange();
         if (!openStore()) return nullptr;
         auto found = store->find(key, url);
         if (!found) {
@@ -339,8 +305,6 @@ private:
     MemoryCache memory GUARDED_BY(mutex);
     /// Hashes of the keys, possibly more; empty until the directory was opened.
     std::optional<std::unordered_set<std::size_t>> onDisk GUARDED_BY(mutex);
-    std::deque<Change> changes GUARDED_BY(mutex); ///< pending ones
-    std::uint64_t queued GUARDED_BY(mutex) = 0;   ///< number of all changes so far
     /// Key hashes of pending and running changes.
     std::unordered_multiset<std::size_t> changing GUARDED_BY(mutex);
     std::size_t waitingBytes GUARDED_BY(mutex) = 0; ///< bytes that those hold
@@ -348,7 +312,6 @@ private:
     bool closed = false;                            // queue: it could not be opened
     std::uint64_t nextAttempt = 0;                  // queue: host ticks
     bool failing = false;                           // queue
-    std::uint64_t made = 0;                         // queue: number of changes made
 };
 
 HttpCache::HttpCache(std::shared_ptr<Impl> impl) : _impl(std::move(impl)) {}

@@ -139,7 +139,6 @@ struct HttpCacheConfiguration {
     std::filesystem::path directory;       ///< created when first needed; if empty, nothing is stored on disk
     FileSystem* files = nullptr;           ///< must outlive the cache; null only without a directory
     std::shared_ptr<Queue> queue;          ///< a serial queue for disk work; null only without a directory
-    std::shared_ptr<Queue> writer;         ///< starts the changes of the disk, with its priority; null: `queue` does
     Clock* clock = nullptr;                ///< must outlive the cache
 };
 

@@ -43,7 +43,6 @@ struct HttpCacheTest : testing::Test, test::ByHand {
                                  .directory = directory / "http",
                                  .files = files.get(),
                                  .queue = queue,
-                                 .writer = writer,
                                  .clock = &clock});
     }
     void store(int number, std::string body, HttpHeaders headers = {{"Content-Type", "image/png"}})
@@ -69,7 +68,6 @@ struct HttpCacheTest : testing::Test, test::ByHand {
 
     test::TemporaryDirectory directory;
     std::shared_ptr<Queue> queue = makeQueue("test.httpCache");
-    std::shared_ptr<Queue> writer; // null: the queue itself
     test::LogCapture log;
     std::shared_ptr<HttpCache> cache;
 };
@@ -220,27 +218,6 @@ TEST_F(HttpCacheTest, WhatWasStoredIsThereWhereverItWaits)
     store(3, "thr");
     drain();
     EXPECT_EQ(seen, "--newtoothr");
-}
-
-TEST_F(HttpCacheTest, ChangesWaitForTheWriterAndReadersDoNot)
-{
-    test::ManualExecutor later;
-    writer = Queue::make("test.writer", Queue::Kind::Serial, later, clock);
-    open();
-    store(1, kLarge);
-    drain();
-    EXPECT_FALSE(fs::exists(directory / "http"));
-    store(2, "two");
-    store(3, "three");
-    EXPECT_EQ(find(2), "two") << "and what was stored before it";
-    EXPECT_EQ(bodyFiles(), 1u);
-    cache->remove(url(1));
-    EXPECT_EQ(bodyFiles(), 1u);
-    later.drain();
-    EXPECT_EQ(bodyFiles(), 0u);
-    open();
-    EXPECT_EQ(find(1) + find(2) + find(3), "(none)twothree");
-    later.drain();
 }
 
 TEST_F(HttpCacheTest, ASlowDiskDoesNotFillTheMemory)
