@@ -11,8 +11,8 @@
 
 namespace fuzz {
 
-/// Checks what would be uploaded of a session: JSON text with every event, and at the end what they refer to, exactly
-/// as the model has it.
+/// Checks the JSON text that a session's upload would have: every event, then the objects that the events refer to. It
+/// must equal the text of the model.
 inline void checkUpload(tavrin::StoredSession& session)
 {
     constexpr std::size_t kKindsOfMissing = 2; // results and suggestions

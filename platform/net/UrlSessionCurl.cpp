@@ -299,8 +299,8 @@ void Loader::endLate(TimePoint now)
     }
 }
 
-/// Sets the timer to the next deadline, unless it fires before: deadlines mostly move on until then. Stops it if there
-/// is no load, so that an idle process isn't woken.
+/// Sets the timer to the next deadline. A timer that fires earlier stays as it is, because deadlines mostly move until
+/// then. Stops the timer if there is no load, so that an idle process isn't woken.
 void Loader::setTimer()
 {
     const bool isIdle = _active.empty();

@@ -49,8 +49,8 @@ struct Promises {
         std::string value;
         std::size_t begun, done;
     };
-    /// An event: since when it is acknowledged, between which calls it goes from its file to an upload, and between
-    /// which the result of the upload is settled.
+    /// The life of an event, in numbers of system calls: when it was acknowledged, when its move from the file to an
+    /// upload began and ended, and when the settling of the upload's result began and ended.
     struct Event {
         std::size_t reported = SIZE_MAX, taken = SIZE_MAX, uploading = SIZE_MAX, answered = SIZE_MAX,
                     settled = SIZE_MAX;

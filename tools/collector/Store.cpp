@@ -10,7 +10,7 @@ namespace collector {
 
 namespace {
 
-// Events are json, not jsonb, which has no texts with "\u0000".
+// The events are of type json, because jsonb can't store a text with "\u0000".
 constexpr const char* kTables = R"(
 SELECT pg_advisory_xact_lock(1);
 CREATE TABLE IF NOT EXISTS uploads (digest text PRIMARY KEY, path text NOT NULL, stored timestamptz NOT NULL DEFAULT now());
