@@ -219,8 +219,8 @@ std::string RecordedDisk::contentsOf(Node node, std::size_t calls, Dice& dice) c
     contents.resize(largest);
     for (auto& [page, left] : changes) {
         left = dice.page(left);
-        const std::size_t begin = std::max(page * kPage, synced), end = std::min(largest, (page + 1) * kPage);
-        if (left == 0 && begin < end && dice.isStale()) contents.replace(begin, end - begin, end - begin, '\x5a');
+        const std::size_t begin = std::max(page * kPage, synced), stop = std::min(largest, (page + 1) * kPage);
+        if (left == 0 && begin < stop && dice.isStale()) contents.replace(begin, stop - begin, stop - begin, '\x5a');
     }
     size = synced;
     for (auto each = unsynced; each != end; ++each) {

@@ -339,7 +339,8 @@ std::string lookAtTransfers(Life& life)
         const auto file = life.files->openForReading((*opened)->downloadPath(task.identifier));
         words += file && isWhole(*file) ? ":received" : ":damaged";
     }
-    for (const std::string& name : *life.files->list(life.root / "state/transfers"))
+    const auto names = *life.files->list(life.root / "state/transfers");
+    for (const std::string& name : names)
         if (name.ends_with(".body") && !words.contains(name.substr(0, 1) + ":body")) words += " orphan " + name;
     StoredTask later{.isUpload = true, .request = requestTo("https://a.example/up")};
     const auto file = temporaryFile(life, "later");
@@ -521,7 +522,7 @@ TEST_P(StorePowerCutTest, KeepsItsPromise)
 }
 
 INSTANTIATE_TEST_SUITE_P(Stores, StorePowerCutTest, testing::ValuesIn(kStores),
-                         [](const auto& info) { return std::string(info.param.name); });
+                         [](const auto& store) { return std::string(store.param.name); });
 
 } // namespace
 } // namespace platform

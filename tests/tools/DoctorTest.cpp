@@ -155,9 +155,9 @@ TEST(Doctor, FindsEachThingThatIsBrokenAndSaysWhatToDo)
             << each.topic << ": " << each.text << "\n"
             << platform::toJson(describe(findings), platform::JsonStyle::Pretty);
         EXPECT_EQ(statusOf(findings), static_cast<int>(each.severity)) << each.text;
-        if (each.severity != kFine)
-            for (const Finding& finding : findings)
-                EXPECT_EQ(finding.severity == kFine, finding.advice.empty()) << finding.text;
+        if (each.severity == kFine) continue;
+        for (const Finding& finding : findings)
+            EXPECT_EQ(finding.severity == kFine, finding.advice.empty()) << finding.text;
     }
 }
 

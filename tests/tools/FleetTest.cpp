@@ -135,7 +135,8 @@ TEST_F(FleetTest, TheCacheNeedsResponsesToAnswer)
     const auto searched = [&](double latency) {
         assumptions.latency = latency;
         unsigned keys = 0, searches = 0;
-        for (const Visit& visit : Typing(corpus(), assumptions, 40).visits()) {
+        const Typing typing(corpus(), assumptions, 40);
+        for (const Visit& visit : typing.visits()) {
             keys += visit.keys;
             searches += visit.searches;
         }
