@@ -275,8 +275,8 @@ TEST_F(HttpCacheTest, DamageIsDroppedAndNeverAnswered)
         const char* what;
         void (*spoil)(const fs::path&);
     } cases[]{
-        {"cut off", [](const fs::path& path) { (void)truncate(path.c_str(), 100); }},
-        {"empty", [](const fs::path& path) { (void)truncate(path.c_str(), 0); }},
+        {"cut off", [](const fs::path& path) { fs::resize_file(path, 100); }},
+        {"empty", [](const fs::path& path) { fs::resize_file(path, 0); }},
         {"gone", [](const fs::path& path) { fs::remove(path); }},
         {"overwritten",
          [](const fs::path& path) {
