@@ -246,14 +246,16 @@ void Exchange::_completed(std::optional<Bytes> data, std::optional<UrlResponse> 
 
     auto decoded = JsonDocument::parse(data->view(), data->size(), kMaximumValues);
     const auto document = decoded ? std::make_shared<const JsonDocument>(std::move(*decoded)) : nullptr;
+    const platform::UrlSource source = platform::sourceOf(*response);
+    // What is left to do behind the reply is one task: a second one would wake another thread.
+    auto behind = [self = shared_from_this(), document, source, responseSize, statusCode, timingData](bool cached) {
+        self->endNetworkFeedback(document.get(), responseSize, statusCode, timingData);
+        return self->_useAnswer(document, source, cached);
+    };
     // The store is queued before the reply, so that a client that has received an answer finds it in the cache. The
     // reply needs only the text, so the sets are created on the cache's queue.
     const bool cached = document && _mayCache(*document);
-    const platform::UrlSource source = platform::sourceOf(*response);
-    if (cached)
-        _client->queryCache()->setMade(
-            [self = shared_from_this(), document, source] { return self->_useAnswer(document, source, true); },
-            _cacheGeneration);
+    if (cached) _client->queryCache()->setMade([behind] { return behind(true); }, _cacheGeneration);
 
     auto reply = std::make_shared<TAVReply>();
     reply->scale = _request->scale;
@@ -265,11 +267,12 @@ void Exchange::_completed(std::optional<Bytes> data, std::optional<UrlResponse> 
     reply->geoSessionEntityString = _assembly.requestFactory->getMapsUserSessionEntity();
     _answer(std::move(reply), document ? OptionalError() : decoded.error());
 
-    if (document && !cached)
-        _assembly.device.globalQueue(platform::Priority::Default)->async([self = shared_from_this(), document, source] {
-            (void)self->_useAnswer(document, source, false);
+    if (!document)
+        endNetworkFeedback(nullptr, responseSize, statusCode, timingData);
+    else if (!cached)
+        _assembly.device.globalQueue(platform::Priority::Default)->async([behind = std::move(behind)] {
+            (void)behind(false);
         });
-    endNetworkFeedback(document.get(), responseSize, statusCode, timingData);
     _forceFetch(*response);
 }
 
