@@ -6,7 +6,9 @@
 #include <sys/epoll.h>
 #include <sys/socket.h>
 #include <unistd.h>
+#include <utility>
 
+#include "platform/base/Mutex.h"
 #include "platform/ipc/BusConnection.h"
 #include "platform/ipc/BusContext.h"
 #include "platform/ipc/IpcLog.h"
@@ -155,7 +157,7 @@ public:
     {
         onLoop([acceptance = _acceptance] { acceptance->start(); });
     }
-    [[nodiscard]] std::string endpoint() const override { return _endpoint; }
+    [[nodiscard]] std::string endpoint() override { return _endpoint; }
 
 private:
     void onLoop(Executor::Job job) { _acceptance->context().loop.execute(Priority::Default, std::move(job)); }
@@ -164,12 +166,57 @@ private:
     const std::string _endpoint;
 };
 
-/// Replaces a listener that could not be created. Its endpoint is empty.
-class DeafListener final : public Listener {
+/// A listener whose socket can't be created at times: whoever asks for its endpoint then tries again.
+class RetryingListener final : public Listener {
 public:
-    void setAcceptor(Acceptor) override {}
-    void resume() override {}
-    [[nodiscard]] std::string endpoint() const override { return {}; }
+    using Make = std::function<Result<std::unique_ptr<Listener>>()>;
+
+    RetryingListener(std::string label, Make make) : _label(std::move(label)), _make(std::move(make))
+    {
+        (void)endpoint();
+    }
+    void setAcceptor(Acceptor acceptor) override
+    {
+        const MutexLock lock(_mutex);
+        _acceptor = std::move(acceptor);
+        if (_listener) _listener->setAcceptor(_acceptor);
+    }
+    void resume() override
+    {
+        const MutexLock lock(_mutex);
+        _resumed = true;
+        if (_listener) _listener->resume();
+    }
+    [[nodiscard]] std::string endpoint() override
+    {
+        const MutexLock lock(_mutex);
+        if (!_listener) _try();
+        return _listener ? _listener->endpoint() : "";
+    }
+
+private:
+    void _try() REQUIRES(_mutex)
+    {
+        auto listener = _make();
+        if (!listener) {
+            if (!std::exchange(_failed, true))
+                kLog.error("{}: can't create an endpoint, trying again when a client asks for it: {}", _label,
+                           listener.error().description());
+            return;
+        }
+        if (_failed) kLog.log("{}: has an endpoint now", _label);
+        _listener = std::move(*listener);
+        if (_acceptor) _listener->setAcceptor(_acceptor);
+        if (_resumed) _listener->resume();
+    }
+
+    const std::string _label;
+    const Make _make;
+    Mutex _mutex;
+    std::unique_ptr<Listener> _listener GUARDED_BY(_mutex);
+    Acceptor _acceptor GUARDED_BY(_mutex);
+    bool _resumed GUARDED_BY(_mutex) = false;
+    bool _failed GUARDED_BY(_mutex) = false;
 };
 
 class BusTransport final : public Transport {
@@ -188,25 +235,28 @@ public:
     Result<std::unique_ptr<Listener>> listen(const Interface& interface, const std::string& label) override
     {
         if (!_askedServiceManager.exchange(true))
-            if (auto socket = ListenSocket::fromServiceManager()) return make(interface, label, std::move(*socket));
+            if (auto socket = ListenSocket::fromServiceManager()) return make(_context, interface, label, std::move(*socket));
         auto socket = ListenSocket::bindExclusive(_directory / "socket");
         if (!socket) return std::unexpected(std::move(socket.error()));
-        return make(interface, label, std::move(*socket));
+        return make(_context, interface, label, std::move(*socket));
     }
 
     std::unique_ptr<Listener> anonymous(const Interface& interface, const std::string& label) override
     {
-        auto socket = ListenSocket::bindUnguessable(_directory, kEndpointPrefix);
-        if (socket) return make(interface, label, std::move(*socket));
-        kLog.error("{}: can't create an endpoint: {}", label, socket.error().description());
-        return std::make_unique<DeafListener>();
+        return std::make_unique<RetryingListener>(
+            label, [context = _context, directory = _directory, &interface, label]() -> Result<std::unique_ptr<Listener>> {
+                auto socket = ListenSocket::bindUnguessable(directory, kEndpointPrefix);
+                if (!socket) return std::unexpected(std::move(socket.error()));
+                return make(context, interface, label, std::move(*socket));
+            });
     }
 
 private:
-    std::unique_ptr<Listener> make(const Interface& interface, const std::string& label, ListenSocket socket)
+    static std::unique_ptr<Listener> make(const std::shared_ptr<BusContext>& context, const Interface& interface,
+                                          const std::string& label, ListenSocket socket)
     {
         return std::make_unique<BusListener>(
-            std::make_shared<Acceptance>(_context, interface, label, std::move(socket)));
+            std::make_shared<Acceptance>(context, interface, label, std::move(socket)));
     }
 
     const std::shared_ptr<BusContext> _context;

@@ -165,8 +165,8 @@ public:
     virtual void setAcceptor(Acceptor acceptor) = 0;
     /// Starts accepting.
     virtual void resume() = 0;
-    /// Returns the D-Bus address of this listener: "unix:path=…".
-    [[nodiscard]] virtual std::string endpoint() const = 0;
+    /// Returns the D-Bus address of this listener: "unix:path=…". Any thread.
+    [[nodiscard]] virtual std::string endpoint() = 0;
 };
 
 /// Creates listeners. One for each process.
@@ -178,8 +178,9 @@ public:
     /// if a process listens on it.
     [[nodiscard]] virtual Result<std::unique_ptr<Listener>> listen(const Interface& interface,
                                                                    const std::string& label) = 0;
-    /// Creates a listener with an unguessable name in the same directory; pass its `endpoint()` to the client. Logs a
-    /// failure and returns a listener with an empty endpoint.
+    /// Creates a listener with an unguessable name in the same directory; pass its `endpoint()` to the client. The
+    /// endpoint is empty while its socket can't be created, which is logged; each call of `endpoint()` tries again.
+    /// `interface` must outlive the listener.
     [[nodiscard]] virtual std::unique_ptr<Listener> anonymous(const Interface& interface, const std::string& label) = 0;
 };
 

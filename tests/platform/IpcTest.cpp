@@ -2,6 +2,8 @@
 
 #include <cstdlib>
 #include <deque>
+#include <filesystem>
+#include <fstream>
 #include <future>
 #include <poll.h>
 #include <sys/mman.h>
@@ -483,6 +485,24 @@ TEST(Ipc, EndpointsAreApartFromEachOtherAndGoWithTheirListener)
     endpoint.reset();
     EXPECT_FALSE(Client::connect(address, kObjectPath, kLong));
     EXPECT_TRUE(call(*client, method("Count"))) << "a connection outlives its listener";
+}
+
+TEST(Ipc, AnEndpointWhoseSocketCantBeCreatedIsTriedAgain)
+{
+    namespace fs = std::filesystem;
+    Service service;
+    const fs::path directory = service.directory(), aside = directory.string() + ".aside";
+    fs::rename(directory, aside);
+    std::ofstream(directory) << "not a directory";
+    const auto endpoint = service.transport->anonymous(probe(), "com.example.endpoint");
+    service.serve(*endpoint);
+    EXPECT_EQ(endpoint->endpoint(), "");
+
+    fs::remove(directory);
+    fs::rename(aside, directory);
+    const auto client = service.connect(*endpoint);
+    EXPECT_TRUE(call(*client, method("Count")));
+    EXPECT_EQ(endpoint->endpoint(), endpoint->endpoint());
 }
 
 TEST(Ipc, ConnectionsBeyondTheLimitWaitForTheirTurn)

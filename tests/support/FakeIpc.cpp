@@ -208,7 +208,7 @@ public:
     explicit FakeListener(std::shared_ptr<Endpoint> endpoint) : _endpoint(std::move(endpoint)) {}
     void setAcceptor(Acceptor acceptor) override { _endpoint->acceptor = std::move(acceptor); }
     void resume() override { _endpoint->resumed = true; }
-    [[nodiscard]] std::string endpoint() const override { return _endpoint->address; }
+    [[nodiscard]] std::string endpoint() override { return _endpoint->address; }
 
 private:
     const std::shared_ptr<Endpoint> _endpoint;

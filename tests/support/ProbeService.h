@@ -128,7 +128,7 @@ public:
     {
         clock.advance(time, [this] { settle(); });
     }
-    std::unique_ptr<Client> connect(const Listener& to)
+    std::unique_ptr<Client> connect(Listener& to)
     {
         return std::move(*Client::connect(to.endpoint(), kObjectPath, kLong));
     }

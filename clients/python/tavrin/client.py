@@ -326,6 +326,8 @@ class Client:
         async with self._connecting:
             if self._closed:
                 raise DaemonAway("the client is closed")
+            if not self._endpoint_address:
+                raise DaemonAway("the daemon can't create the socket for this; its log says why. Connect again once that is mended")
             if self._endpoint is None or self._endpoint.lost:
                 self._endpoint = await Connection.open(self._endpoint_address)
             return self._endpoint
