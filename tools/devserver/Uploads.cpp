@@ -40,6 +40,16 @@ std::optional<std::string> shapeProblem(const Upload& upload)
     return std::nullopt;
 }
 
+/// Counts the events that a device has recorded. It makes two more when it uploads.
+std::size_t recordedEvents(const Value& session)
+{
+    const auto* events = session["fb"].asArray();
+    return !events ? 0 : std::ranges::count_if(*events, [](const Value& event) {
+        const std::string* type = event["type"].asString();
+        return !type || (*type != "session_missing_results" && *type != "session_missing_suggestions");
+    });
+}
+
 /// Returns the text with blanks instead of control characters.
 std::string oneLine(std::string text)
 {
@@ -94,8 +104,8 @@ Uploads::Seen& Uploads::_seen(const std::string& digest)
 std::string Uploads::add(Upload upload, const Answer& answer)
 {
     const std::string* agent = upload.json["agent"].asString();
-    const std::size_t events = upload.json["fb"].count();
-    const bool taken = answer.status == 200 && !answer.cut;
+    const std::size_t events = upload.json["fb"].count(), recorded = recordedEvents(upload.json);
+    const bool taken = answer.status == 200; // devices count it as sent, even if the rest of the answer is cut
 
     const platform::MutexLock lock(_mutex);
     // A wrong digest does not identify the upload, so its repeats are not counted.
@@ -106,7 +116,10 @@ std::string Uploads::add(Upload upload, const Answer& answer)
     if (repeat > 0) ++_totals.repeats;
     if (taken) {
         ++_totals.taken;
-        if (seen.taken++ == 0) _totals.events += events;
+        if (seen.taken++ == 0) {
+            _totals.events += events;
+            _totals.recorded += recorded;
+        }
     }
 
     std::string line = fmt::format("upload {}: {}{}, {}, {}, {} bytes packed to {}, {}{}", ++_lastNumber, upload.path,
@@ -175,7 +188,8 @@ Value Uploads::totals() const
                                 {"taken", _totals.taken},
                                 {"refused", _totals.received - _totals.taken},
                                 {"repeats", _totals.repeats},
-                                {"events", _totals.events}});
+                                {"events", _totals.events},
+                                {"recorded", _totals.recorded}});
 }
 
 void Uploads::clear()

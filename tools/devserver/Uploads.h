@@ -52,8 +52,9 @@ public:
     [[nodiscard]] platform::Value summaries() const;
     /// Returns the upload with that number; null if it isn't kept.
     [[nodiscard]] platform::Value find(std::uint64_t number) const;
-    /// Returns {"received", "taken", "refused", "repeats", "events"}: counts since the start or `clear`. An upload is
-    /// taken if its answer was a complete 200. Its events are counted once for each digest.
+    /// Returns {"received", "taken", "refused", "repeats", "events", "recorded"}: counts since the start or `clear`. An
+    /// upload is taken if its answer's status was 200, cut or not, as devices count it. Its events are counted once for
+    /// each digest: all, and without those that a device makes when it uploads, as in its books.
     [[nodiscard]] platform::Value totals() const;
     void clear();
 
@@ -63,7 +64,7 @@ private:
         std::uint64_t received = 0, taken = 0;
     };
     struct Totals {
-        std::uint64_t received = 0, taken = 0, repeats = 0, events = 0;
+        std::uint64_t received = 0, taken = 0, repeats = 0, events = 0, recorded = 0;
     };
     struct Kept {
         std::size_t size;
