@@ -58,7 +58,8 @@ Result<std::unique_ptr<ipc::Client>> TAVConnection::open(const std::string& addr
 {
     if (address.empty()) // of an endpoint
         return std::unexpected(clientError(
-            ENOENT, "the daemon can't create the socket for this; its log says why. Connect again once that is mended"));
+            ENOENT,
+            "the daemon can't create the socket for this; its log says why. Connect again once that is mended"));
     return ipc::Client::connect(address, std::string(kObjectPath), kConnectTimeout);
 }
 

@@ -235,7 +235,8 @@ public:
     Result<std::unique_ptr<Listener>> listen(const Interface& interface, const std::string& label) override
     {
         if (!_askedServiceManager.exchange(true))
-            if (auto socket = ListenSocket::fromServiceManager()) return make(_context, interface, label, std::move(*socket));
+            if (auto socket = ListenSocket::fromServiceManager())
+                return make(_context, interface, label, std::move(*socket));
         auto socket = ListenSocket::bindExclusive(_directory / "socket");
         if (!socket) return std::unexpected(std::move(socket.error()));
         return make(_context, interface, label, std::move(*socket));
@@ -244,7 +245,8 @@ public:
     std::unique_ptr<Listener> anonymous(const Interface& interface, const std::string& label) override
     {
         return std::make_unique<RetryingListener>(
-            label, [context = _context, directory = _directory, &interface, label]() -> Result<std::unique_ptr<Listener>> {
+            label,
+            [context = _context, directory = _directory, &interface, label]() -> Result<std::unique_ptr<Listener>> {
                 auto socket = ListenSocket::bindUnguessable(directory, kEndpointPrefix);
                 if (!socket) return std::unexpected(std::move(socket.error()));
                 return make(context, interface, label, std::move(*socket));
