@@ -289,7 +289,7 @@ private:
 
     std::unique_ptr<BackgroundStore> _store;
     std::optional<Error> _storeError; // why the store is missing, or a temporary one
-    Duration _storeRetry{};           // earliest time of the next attempt to open it
+    Duration _storeRetry{};           // earliest time of the next attempt to replace a temporary one
     LivedTime _time;
     std::map<std::uint64_t, Entry> _entries;
     std::vector<std::uint64_t> _leftOver; ///< ended tasks that are still in the store
@@ -343,7 +343,7 @@ void Session::_openStore(bool make)
     const bool isTemporary = _store && _storeError;
     if (_store && !(isTemporary && _entries.empty())) return;
     if (!make && !BackgroundStore::exists(_environment.files, directory)) return;
-    if (_storeError && _time.now() < _storeRetry) return;
+    if (isTemporary && _time.now() < _storeRetry) return;
     auto store = BackgroundStore::open(_environment.files, directory);
     _storeError = store ? std::nullopt : std::optional(store.error());
     if (!store) {
