@@ -505,9 +505,9 @@ void BusConnection::send(sd_bus_message* message, std::size_t size)
 {
     if (_state != State::Open || _peerGone) return;
     if (_messageDue && peerHasGone()) return; // if the write failed, the part that sd-bus has read would be lost
-    if (!message) return end("out of memory");
-    sd_bus_message_set_sender(message, kOwnName);
-    if (!sd_bus_message_get_destination(message)) sd_bus_message_set_destination(message, kPeerName);
+    if (!message || sd_bus_message_set_sender(message, kOwnName) < 0 ||
+        (!sd_bus_message_get_destination(message) && sd_bus_message_set_destination(message, kPeerName) < 0))
+        return end("out of memory");
     const int result = sd_bus_send(_bus.get(), message, nullptr);
     if (result < 0) return isDisconnect(result) ? driveAgain() : end(describe(result));
     settleWriteQueue(size + kMessageOverhead);
