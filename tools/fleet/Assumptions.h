@@ -31,8 +31,8 @@ struct Assumptions {
     double imageBytes = 20'000;
     double bagBytes = 3'000;
     double resourceBytes = 200'000;
-    double uploadBytes = 700;
-    double eventBytes = 60;
+    double uploadBytes = 600;
+    double eventBytes = 25;
     double failureSeconds = 1;
 };
 
