@@ -484,7 +484,7 @@ void Session::_networkChanged()
     _pump();
 }
 
-/// Ends the delays after failures: of the tasks to a host, or of all.
+/// Ends the delays after failures of the tasks to a host, or of all; further failures begin with the shortest again.
 void Session::_retryNow(std::optional<std::string_view> host)
 {
     for (auto& [identifier, entry] : _entries) {
@@ -492,6 +492,7 @@ void Session::_retryNow(std::optional<std::string_view> host)
         if (entry.attempt || task.failures == 0 || task.notBefore == Duration::zero()) continue;
         if (host && task.request->url.host() != *host) continue;
         task.notBefore = Duration::zero();
+        task.failures = 0;
         _schedule(entry);
     }
 }

@@ -494,6 +494,9 @@ TEST_F(BackgroundSessionTest, ASuccessOfTheHostEndsItsDelays)
     process.answer(200);
     ASSERT_EQ(process.attempts().size(), 1u);
     EXPECT_EQ(process.attempts()[0]->originalRequest().url.host(), "a.example");
+    process.fail(kUrlConnectionLost);
+    process.advance(30s);
+    ASSERT_EQ(process.attempts().size(), 1u) << "the delays begin anew";
     process.answer(200);
     EXPECT_TRUE(process.attempts().empty()) << "another host";
 }

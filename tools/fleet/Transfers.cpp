@@ -30,6 +30,7 @@ void Transfers::retryNow(Duration now)
     for (auto& [identifier, task] : _tasks) {
         if (task.failures == 0 || task.notBefore == Duration::zero()) continue;
         task.notBefore = Duration::zero();
+        task.failures = 0;
         schedule(identifier, task, now);
     }
 }
