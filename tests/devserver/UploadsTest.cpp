@@ -86,6 +86,20 @@ TEST(Uploads, SaysWhatIsWrongWithABody)
     EXPECT_EQ(checkUpload(uploadOf("/crowdsourcing", "{}", sha512("{}"))).problem, std::nullopt) << "any object";
 }
 
+TEST(Uploads, CountsWhatDevicesCountAsSentAndOnce)
+{
+    const std::string text = R"({"fb":[{"type":"search_start","timestamp":0},)"
+                             R"({"type":"session_missing_results","timestamp":0},)"
+                             R"({"type":"session_missing_suggestions","timestamp":0}],"agent":"A/1","user_guid":"G"})";
+    Uploads uploads;
+    for (const auto& [status, cut] : {std::pair(503, false), {200, true}, {200, false}}) {
+        Upload upload = checkUpload(uploadOf("/feedback", text, sha512(text)));
+        uploads.add(std::move(upload), Answer{.status = status, .cut = cut});
+    }
+    EXPECT_EQ(platform::toJson(uploads.totals()),
+              R"({"received":3,"taken":2,"refused":1,"repeats":2,"events":3,"recorded":1})");
+}
+
 TEST(Uploads, ASessionSaysWhatWasSentAndWhatCameFromMemory)
 {
     const std::string text =

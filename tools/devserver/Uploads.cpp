@@ -40,7 +40,7 @@ std::optional<std::string> shapeProblem(const Upload& upload)
     return std::nullopt;
 }
 
-/// Counts the events that a device has recorded. It makes two more when it uploads.
+/// Counts the events that a device has recorded. When it uploads, it makes up to two more.
 std::size_t recordedEvents(const Value& session)
 {
     const auto* events = session["fb"].asArray();

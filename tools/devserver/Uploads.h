@@ -53,8 +53,9 @@ public:
     /// Returns the upload with that number; null if it isn't kept.
     [[nodiscard]] platform::Value find(std::uint64_t number) const;
     /// Returns {"received", "taken", "refused", "repeats", "events", "recorded"}: counts since the start or `clear`. An
-    /// upload is taken if its answer's status was 200, cut or not, as devices count it. Its events are counted once for
-    /// each digest: all, and without those that a device makes when it uploads, as in its books.
+    /// upload is taken if its answer had status 200, even if the rest was cut: devices count it as sent. "events" has
+    /// the events of taken uploads, once for each digest; "recorded" leaves out those that a device makes when it
+    /// uploads, as its books do.
     [[nodiscard]] platform::Value totals() const;
     void clear();
 
