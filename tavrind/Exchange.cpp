@@ -247,7 +247,7 @@ void Exchange::_completed(std::optional<Bytes> data, std::optional<UrlResponse> 
     auto decoded = JsonDocument::parse(data->view(), data->size(), kMaximumValues);
     const auto document = decoded ? std::make_shared<const JsonDocument>(std::move(*decoded)) : nullptr;
     const platform::UrlSource source = platform::sourceOf(*response);
-    // What is left to do behind the reply is one task: a second one would wake another thread.
+    // All work after the reply is one task, because a second task would wake another thread.
     auto behind = [self = shared_from_this(), document, source, responseSize, statusCode, timingData](bool cached) {
         self->endNetworkFeedback(document.get(), responseSize, statusCode, timingData);
         return self->_useAnswer(document, source, cached);

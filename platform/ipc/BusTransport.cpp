@@ -166,7 +166,7 @@ private:
     const std::string _endpoint;
 };
 
-/// A listener whose socket can't be created at times: whoever asks for its endpoint then tries again.
+/// A listener whose socket perhaps can't be created yet. Each call of `endpoint` tries again, until there is one.
 class RetryingListener final : public Listener {
 public:
     using Make = std::function<Result<std::unique_ptr<Listener>>()>;

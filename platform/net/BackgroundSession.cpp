@@ -484,7 +484,7 @@ void Session::_networkChanged()
     _pump();
 }
 
-/// Ends the delays after failures of the tasks to a host, or of all; further failures begin with the shortest again.
+/// Ends the delays after failures of the tasks to a host, or of all. The next failure has the shortest delay again.
 void Session::_retryNow(std::optional<std::string_view> host)
 {
     for (auto& [identifier, entry] : _entries) {
