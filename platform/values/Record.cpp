@@ -71,7 +71,9 @@ void Decoder::failedIn(std::size_t index)
 std::optional<Error> Decoder::error() const
 {
     if (!_failure) return std::nullopt;
-    return Error::withReason(std::string(kFormatErrorDomain), _failure->code,
+    // Only a record's own class may be unknown to its reader. An unknown class inside it is a malformed field.
+    const std::int64_t code = _failure->place.empty() ? _failure->code : kMalformed;
+    return Error::withReason(std::string(kFormatErrorDomain), code,
                              _failure->place.empty() ? _failure->reason
                                                      : fmt::format("{}: {}", _failure->place, _failure->reason));
 }

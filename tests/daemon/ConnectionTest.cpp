@@ -140,11 +140,21 @@ TEST_F(ConnectionTest, CallsWithoutARecordAreNotAnsweredAndMalformedOnesAreRefus
         EXPECT_TRUE(call(*connection, "Request", {Dictionary()})->abandoned());
         EXPECT_TRUE(call(*connection, "Request", {Dictionary{{"class", "TAVRequest"}}})->abandoned());
         EXPECT_TRUE(call(*connection, "ReportEvent", {"event", 1, Dictionary()})->answered());
-        const auto refused =
-            call(*connection, "Request", {Dictionary{{"class", "TAVSearchRequest"}, {"queryId", "one"}}})->take();
-        ASSERT_FALSE(refused);
-        EXPECT_TRUE(refused.error().message.contains("request") && refused.error().message.contains("queryId"))
-            << refused.error().message;
+        const Dictionary unknown{{"class", "TAVOfTomorrow"}};
+        const std::tuple<const char*, Value::Array, const char*> malformed[]{
+            {"Request", {Dictionary{{"class", "TAVSearchRequest"}, {"queryId", "one"}}}, "queryId: "},
+            {"Request",
+             {Dictionary{{"class", "TAVSearchRequest"}, {"queryItems", Value::Array{unknown}}}},
+             "queryItems[0]: "},
+            {"ReportEvent",
+             {"", 1, Dictionary{{"class", "ZRCardSectionEngagementFeedback"}, {"cardSection", unknown}}},
+             "cardSection: "},
+        };
+        for (const auto& [name, arguments, field] : malformed) {
+            const auto refused = call(*connection, name, arguments)->take();
+            ASSERT_FALSE(refused) << field;
+            EXPECT_TRUE(refused.error().message.contains(field)) << refused.error().message;
+        }
         EXPECT_FALSE(connection->invalidated());
     }
 }
