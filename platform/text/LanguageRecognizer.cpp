@@ -2,12 +2,14 @@
 
 #include <cld2/public/compact_lang_det.h>
 
+#include "platform/text/Text.h"
+
 namespace platform {
 
 std::string recognizedLanguage(std::string_view text)
 {
     constexpr std::size_t kEnough = 4096;
-    text = text.substr(0, kEnough);
+    text = cut(text, kEnough); // the recogniser refuses a text that ends within a character
     bool reliable = false;
     int textBytes = 0;
     int validPrefix = 0;

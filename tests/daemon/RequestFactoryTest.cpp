@@ -273,8 +273,10 @@ TEST_F(RequestFactoryTest, ALookupSaysWhatIsKnownOfIt)
 {
     using Type = LookupSelectionType;
     const char* english = "The quick brown fox jumps over the lazy dog and runs away through the forest";
+    std::string japanese = "aa"; // so that no multiple of 1,024 bytes ends with a character
+    while (japanese.size() < 6000) japanese += "東京の天気予報を調べています。";
     const struct {
-        const char* words;
+        std::string words;
         std::optional<std::string> context;
         Type selection;
         std::optional<std::string> qlang, lctxlang;
@@ -284,6 +286,7 @@ TEST_F(RequestFactoryTest, ALookupSaysWhatIsKnownOfIt)
         {"42", "17", Type::Default, std::nullopt, std::nullopt, "default"},
         {"42", english, Type::HintTap, std::nullopt, "en", "hint"},
         {english, "", static_cast<Type>(7), "en", std::nullopt, "default"},
+        {"42", japanese, Type::Default, std::nullopt, "ja", "default"},
     };
     for (const auto& c : cases) {
         TAVLookupRequest lookup;
