@@ -440,8 +440,8 @@ void TAVNetworkRequestFactory::_setUpDebuggingQueryItems()
         const std::string_view piece = rest.substr(0, end);
         if (end != std::string_view::npos) rest.remove_prefix(end + 1);
         const std::size_t equals = piece.find('=');
-        const bool valid = equals != std::string_view::npos && equals > 0 && equals + 1 < piece.size() &&
-                           piece.find('=', equals + 1) == std::string_view::npos;
+        const bool valid =
+            equals != std::string_view::npos && equals > 0 && piece.find('=', equals + 1) == std::string_view::npos;
         if (valid)
             _context.debuggingQueryItems.emplace_back(std::string(piece.substr(0, equals)),
                                                       std::string(piece.substr(equals + 1)));
