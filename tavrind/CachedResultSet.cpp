@@ -1,8 +1,9 @@
 #include "tavrind/CachedResultSet.h"
 
 #include <algorithm>
-#include <cmath>
 #include <cstdlib>
+
+#include <fmt/format.h>
 
 #include "platform/text/Text.h"
 #include "platform/values/Error.h"
@@ -71,12 +72,15 @@ std::size_t CachedResultSet::resultSetSize() const
     return answer.size() - std::string_view("[]").size();
 }
 
-CachedUse useOf(const CachedResultSet& set, std::size_t typedLength, double scale, Date now)
+float scaleAsSent(double scale)
+{
+    return scale > 0 ? std::strtof(fmt::format("{:.1f}", scale).c_str(), nullptr) : 0;
+}
+
+CachedUse useOf(const CachedResultSet& set, std::size_t typedLength, float scale, Date now)
 {
     if (set.expireTime && *set.expireTime <= now) return CachedUse::Expired;
-    // The header has one decimal: scales that round to the same value are equal for the service.
-    constexpr double kSameScale = 0.05 + 1e-6;
-    if (scale > 0 && std::abs(scale - set.uiScale) > kSameScale) return CachedUse::OtherScale;
+    if (scale > 0 && scale != set.uiScale) return CachedUse::OtherScale;
     return typedLength >= set.inputLength ? CachedUse::Candidate : CachedUse::OtherInput;
 }
 

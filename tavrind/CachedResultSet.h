@@ -46,9 +46,11 @@ enum class CachedUse {
     OtherInput, ///< skip it: it was fetched for a longer input
     Candidate,  ///< the set fits
 };
-/// `typedLength` is in UTF-16 units. `scale` is the client's screen scale, which is compared to one decimal; 0 accepts
-/// any set.
-[[nodiscard]] CachedUse useOf(const CachedResultSet& set, std::size_t typedLength, double scale, platform::Date now);
+/// Returns a screen scale as a request's header has it, with one decimal: scales that the service can't tell apart are
+/// equal. 0 for none.
+[[nodiscard]] float scaleAsSent(double scale);
+/// `typedLength` is in UTF-16 units. `scale` is the client's screen scale as it is sent; 0 accepts any set.
+[[nodiscard]] CachedUse useOf(const CachedResultSet& set, std::size_t typedLength, float scale, platform::Date now);
 
 /// Returns the candidate with the shortest query. Among equally short ones, prefers the highest positive score, then
 /// the first. Returns null if there are no candidates.

@@ -37,10 +37,11 @@ std::shared_ptr<const CachedResultSet> CachedResultSets::find(std::string_view t
     const std::string key = platform::lowerCased(text);
     const std::size_t keyLength = platform::utf16Length(key);
     log(kLogCaching).debug("cache lookup: {}", key);
+    const float sent = scaleAsSent(scale);
     std::vector<std::string> expired;
     std::vector<const CachedResultSet*> candidates;
     _tree.keysMatchingPrefix(key, [&](std::string_view query, const CachedResultSet& set, bool&) {
-        const CachedUse use = useOf(set, keyLength, scale, now);
+        const CachedUse use = useOf(set, keyLength, sent, now);
         if (use == CachedUse::Expired) expired.emplace_back(query);
         if (use == CachedUse::Candidate) candidates.push_back(&set);
     });

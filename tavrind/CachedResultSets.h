@@ -15,7 +15,8 @@ namespace tavrin {
 /// Has no clock and no queue. Not thread-safe.
 class CachedResultSets {
 public:
-    /// Returns the best set for a typed text, or null. Removes expired sets that it finds. `scale` as in `useOf`.
+    /// Returns the best set for a typed text, or null. Removes expired sets that it finds. `scale` is the client's
+    /// screen scale; 0 accepts any set.
     [[nodiscard]] std::shared_ptr<const CachedResultSet> find(std::string_view text, double scale, platform::Date now);
     /// Stores the set under its query, in place of an earlier one. Returns false if it may not be stored.
     bool store(std::shared_ptr<const CachedResultSet> set);

@@ -63,9 +63,12 @@ TEST(CachedResultSet, IsUsedWhereAgeScaleAndInputFit)
         {4, 3.1, kNow, CachedUse::OtherScale},  {4, 3, kNow + 59s, CachedUse::Candidate},
         {4, 3, kNow + 60s, CachedUse::Expired}, {2, 2, kNow + 60s, CachedUse::Expired},
     };
-    for (const auto& c : cases) EXPECT_EQ(useOf(*set, c.typed, c.scale, c.now), c.use) << c.typed << " " << c.scale;
-    EXPECT_EQ(useOf(*makeSet("a", {{"query", "ab"}}, 1.25), 1, 1.25, kNow), CachedUse::Candidate)
-        << "the header has tenths";
+    for (const auto& c : cases)
+        EXPECT_EQ(useOf(*set, c.typed, scaleAsSent(c.scale), c.now), c.use) << c.typed << " " << c.scale;
+    const auto sent = makeSet("a", {{"query", "ab"}}, 1.75);
+    for (const auto& [scale, use] :
+         {std::pair(1.75, CachedUse::Candidate), {1.8, CachedUse::Candidate}, {1.7, CachedUse::OtherScale}})
+        EXPECT_EQ(useOf(*sent, 1, scaleAsSent(scale), kNow), use) << scale << ": the header has tenths, 1.8";
 }
 
 TEST(CachedResultSet, TheShortestThenTheBestThenTheFirstIsPicked)
