@@ -173,9 +173,14 @@ void Exchange::_send()
     else
         log.log("Dispatching network request for {}", _kind.name);
 
-    // Read first: if the cache is emptied after this point, the answer belongs to an earlier state and is not cached.
-    if (const auto& cache = _client->queryCache()) _cacheGeneration = cache->generation();
     const auto guids = _client->guidController();
+    if (guids) {
+        (void)guids->currentUserGUID();   // replaces an expired GUID
+        (void)guids->lastKnownUserGUID(); // returns after that has emptied the query caches
+    }
+    // If the cache is emptied after this point, the answer belongs to an earlier state and is not cached.
+    if (const auto& cache = _client->queryCache()) _cacheGeneration = cache->generation();
+    _view = _client->view();
     const double timeout = _view.configuration ? _view.configuration->timeoutIntervalForRequest : 0;
     const std::string userAgent = _view.userAgent.value_or("");
     // Reading the GUID may replace it, which empties query caches. So it is only read for a request that is about to be

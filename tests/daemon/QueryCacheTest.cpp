@@ -234,6 +234,15 @@ TEST_F(QueryCacheTest, AnswersOfBeforeAChangeAreNotStored)
     }
 }
 
+TEST_F(QueryCacheTest, TheAnswerToTheSearchThatReplacesTheGuidIsStored)
+{
+    auto connection = client();
+    device.advance(15min);
+    (void)search(*connection, 1, "weat");
+    respond(R"([{"query": "weather"}])");
+    EXPECT_TRUE(search(*connection, 2, "weathe")->answered());
+}
+
 TEST_F(QueryCacheTest, ASearchIsAnsweredFromIt)
 {
     auto connection = client();
