@@ -105,7 +105,9 @@ void ClientStateManager::loadState()
     stateCacheQueue->sync([&] {
         for (const Value& session : *stored.asArray()) {
             const std::string* identifier = session["identifier"].asString();
-            if (!identifier || identifier->empty()) continue;
+            if (!identifier || identifier->empty() || identifier->size() > TAVSessionConfiguration::kMaximumName)
+                continue;
+            if (stateCache.size() >= kMaximumStates) break;
             auto state = std::make_shared<ClientState>(*identifier, _assembly);
             if (const std::string* agent = session["agent"].asString()) state->setUserAgent(*agent);
             stateCache[*identifier] = std::move(state);
