@@ -116,6 +116,7 @@ struct TavrinBagController::Fetch {
     std::shared_ptr<ZRStartNetworkSearchFeedback> start;
     std::string userGuid;
     std::string url;
+    std::string cacheUrl; // of the bag cache request, before the request was built: the country may change meanwhile
     Value timingData;
     Completion completion;
     platform::Clock::TimerId limit = 0;
@@ -274,18 +275,18 @@ Value TavrinBagController::diskCachedBagDictionary()
     return std::move(*bag); // stale or not
 }
 
-Value TavrinBagController::_dictionaryToCacheBag(const Value& fetched)
+Value TavrinBagController::_dictionaryToCacheBag(const Value& fetched, const std::string& cacheUrl)
 {
     Value bag = fetched;
     platform::Dictionary& entries = bag.mutableDictionary();
     entries.set(kExpirationKey, bagExpiration(_assembly.device.clock.wallNow()));
-    entries.set(kBagUrlKey, _bagCacheURL());
+    entries.set(kBagUrlKey, cacheUrl);
     return bag;
 }
 
-Value TavrinBagController::cacheBagDictionary(const Value& fetched)
+Value TavrinBagController::cacheBagDictionary(const Value& fetched, const std::string& cacheUrl)
 {
-    Value bag = _dictionaryToCacheBag(fetched);
+    Value bag = _dictionaryToCacheBag(fetched, cacheUrl);
     if (!Flags::diskBagCacheEnabled()) {
         log(kLogBag).log("skipping writing bag to disk because the flag is disabled");
         return bag;
@@ -331,6 +332,7 @@ void TavrinBagController::_fetchBagStateWithVersion(const std::string& version)
 
 void TavrinBagController::_fetchBagStateWithVersion(const std::string& version, Completion completion)
 {
+    std::string cacheUrl = _bagCacheURL();
     platform::UrlRequest request = _assembly.requestFactory->bagFetchRequest(*this, _userAgent, version);
     request.maximumResponseSize = kMaximumBagSize;
     log(kLogBag).debug("Initiating bag fetch attempt with request {} header {}", request.url.string(),
@@ -340,6 +342,7 @@ void TavrinBagController::_fetchBagStateWithVersion(const std::string& version, 
     fetch->transaction = _assembly.device.transactions.begin("bagFetch");
     fetch->completion = std::move(completion);
     fetch->url = request.url.string();
+    fetch->cacheUrl = std::move(cacheUrl);
     fetch->start = startNetworkSearchFeedback("", request, StartSearchTrigger::Bag, EndpointType::TavrinBag);
     fetch->start->timestamp = _assembly.device.clock.hostTicks();
     if (_assembly.guidController) fetch->userGuid = _assembly.guidController->currentUserGUID().string();
@@ -411,7 +414,7 @@ void TavrinBagController::_fetchCompleted(Fetch& fetch, std::optional<platform::
         error = makeTAVError(TAVErrorBagFetch, "not JSON object");
     } else {
         log(kLogBag).log("Got bag: {}", platform::toJson(*parsed));
-        bag = std::make_shared<const TAVBag>(cacheBagDictionary(*parsed), _userAgent);
+        bag = std::make_shared<const TAVBag>(cacheBagDictionary(*parsed, fetch.cacheUrl), _userAgent);
         cacheBagState(bag, false);
         _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.bag.fetches");
     }

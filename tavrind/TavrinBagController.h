@@ -112,10 +112,10 @@ private:
     };
 
     [[nodiscard]] platform::Value diskCachedBagDictionary();
-    [[nodiscard]] platform::Value cacheBagDictionary(const platform::Value& fetched);
+    [[nodiscard]] platform::Value cacheBagDictionary(const platform::Value& fetched, const std::string& cacheUrl);
     void cacheBagState(std::shared_ptr<const TAVBag> bag, bool fromDisk);
     [[nodiscard]] platform::Result<std::string> _pathToCachedBag();
-    [[nodiscard]] platform::Value _dictionaryToCacheBag(const platform::Value& fetched);
+    [[nodiscard]] platform::Value _dictionaryToCacheBag(const platform::Value& fetched, const std::string& cacheUrl);
     [[nodiscard]] bool _isRefreshRequiredForCachedBag(const platform::Value& rawBag);
     [[nodiscard]] std::string _bagCacheURL();
     void _fetchBagStateWithVersion(const std::string& version);

@@ -217,12 +217,19 @@ TEST_F(BagControllerTest, OnlyAChangeOfTheUrlCausesAFetch)
     device.locale.handler(platform::LocaleSource::Change::Locale);
     device.drain();
     EXPECT_EQ(tasks().size(), 2u);
+    device.locale.context.identifier = "de_CH"; // while the bag for fr_CH is fetched
+    device.locale.handler(platform::LocaleSource::Change::Locale);
+    device.drain();
+    deliverBag();
+    (void)controller().currentBag();
+    device.drain();
+    ASSERT_EQ(tasks().size(), 3u) << "the bag is for fr_CH";
     deliverBag();
     const platform::Notification fromAnother{.name = TAVBagRefreshRequired, .object = this};
     device.clock.setWall(device.clock.wallNow() + 14400s);
     device.notifications.post(fromAnother);
     device.drain();
-    EXPECT_EQ(tasks().size(), 2u) << "only the request factory is listened to";
+    EXPECT_EQ(tasks().size(), 3u) << "only the request factory is listened to";
 }
 
 TEST_F(BagControllerTest, TellsTheSystemWhenTheNewsClientsFortuneChanges)
