@@ -28,7 +28,8 @@ constexpr double kLargestLimit = 1e15;
 /// Limits of open and listed files, by `FileUse`; each open file takes a descriptor. One-off sessions have a separate
 /// limit, so that they never prevent the creation of a real session's file.
 constexpr std::array kMaximumFiles{2000, 100};
-constexpr int kMaximumSessionFileAttempts = 16;
+/// More than there are files: those that are too old keep their names until they are deleted, after the start.
+constexpr int kMaximumSessionFileAttempts = 2200;
 
 constexpr std::size_t index(FileUse use)
 {
@@ -150,7 +151,7 @@ std::shared_ptr<FileContainer> TavrinPersistentStorage::createFileContainerForWr
         log(kLogFeedbackStorage).error("{} session files of this use exist, creating none", kMaximumFiles[index(use)]);
         return nullptr;
     }
-    // Skips names that another process has used since the scan.
+    // Skips names of files that wait for their deletion, or that another process has created since the scan.
     for (int attempt = 0; attempt < kMaximumSessionFileAttempts; ++attempt) {
         const auto fileUrl = _newFileUrl();
         if (!fileUrl) break;
@@ -160,8 +161,9 @@ std::shared_ptr<FileContainer> TavrinPersistentStorage::createFileContainerForWr
             ++_fileCounts[index(use)];
             return std::make_shared<FileContainer>(_store, *fileUrl, std::move(*file), use);
         }
+        if (file.error().code == EEXIST) continue;
         log(kLogFeedbackStorage).error("{}", file.error().description());
-        if (file.error().code != EEXIST) break;
+        break;
     }
     log(kLogFeedbackStorage).error("Could not get a file url");
     return nullptr;

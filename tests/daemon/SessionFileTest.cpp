@@ -357,6 +357,12 @@ TEST_F(SessionFileTest, OldFilesAreDeleted)
     device.drain();
     EXPECT_EQ(sessionFiles(), (std::vector<std::string>{"session.2", "session.3"}));
     EXPECT_EQ(counter("filetooold"), 1);
+
+    device.files.files.clear();
+    for (int number = 1; number <= 2100; ++number)
+        place(("session." + std::to_string(number)).c_str(), std::chrono::hours(49));
+    const auto again = TavrinPersistentStorage::make(assembly());
+    EXPECT_TRUE(again->createFileContainerForWriting(FileUse::Session)) << "before the old ones are gone";
 }
 
 TEST_F(SessionFileTest, WhatStandsInTheWayIsLeftAlone)
