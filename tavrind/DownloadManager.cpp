@@ -36,7 +36,7 @@ constexpr std::chrono::seconds kLongestWait(60);
 std::string identifierOf(const UrlRequest& request)
 {
     const std::string* identifier = request.headers.find(kIdentifierHeader);
-    return identifier && isResource(*identifier) ? *identifier : std::string();
+    return identifier ? *identifier : std::string();
 }
 
 std::string textOf(const platform::HttpHeaders& headers)
@@ -337,9 +337,11 @@ void DownloadManager::taskDidFinishDownloading(const std::shared_ptr<platform::B
 {
     const UrlRequest& request = task->originalRequest();
     const std::string identifier = identifierOf(request);
-    if (identifier.empty())
-        return log(kLogDownloadManager)
+    if (!isResource(identifier)) {
+        log(kLogDownloadManager)
             .error("failed to find download for identifier: {} url: {}", identifier, request.url.string());
+        return logTaskError(fmt::format("can't find {}", identifier));
+    }
     const auto path = _pathToResource(identifier);
     if (!path) return log(kLogDownloadManager).error("failed getting destination URL for {}", identifier);
 
