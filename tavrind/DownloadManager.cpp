@@ -86,7 +86,6 @@ void DownloadManager::setLookupResources(std::weak_ptr<LookupResources> lookupRe
         const auto self = weak.lock();
         if (!self) return;
         self->_lookupResources = lookupResources;
-        self->_publish();
     });
 }
 
@@ -275,10 +274,8 @@ UrlRequest DownloadManager::_createDownloadRequest(const DownloadResource& resou
 
 std::string DownloadManager::_resourceVersion(const DownloadResource& resource) const
 {
-    if (isLookupResource(resource.identifier) && resource.redirectUrl) {
-        const auto lookup = _lookupResources.lock();
-        return lookup ? lookup->signatureFromURL(*resource.redirectUrl).value_or("") : "";
-    }
+    if (isLookupResource(resource.identifier) && resource.redirectUrl)
+        return signatureFromURL(*resource.redirectUrl).value_or("");
     return resource.url ? resource.url->queryValue("version").value_or("") : "";
 }
 

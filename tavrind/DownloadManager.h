@@ -44,8 +44,6 @@ class LookupResources {
 public:
     virtual ~LookupResources() = default;
     [[nodiscard]] virtual bool lookupEnabled() const = 0;
-    /// Returns the version of the hints at a URL; nothing if the URL has none.
-    [[nodiscard]] virtual std::optional<std::string> signatureFromURL(const platform::Url& url) const = 0;
 };
 
 /// Keeps a local copy of each resource file that the bag lists.
@@ -67,7 +65,7 @@ public:
     explicit DownloadManager(Assembly& assembly);
     ~DownloadManager() override;
 
-    /// Sets the source of facts about lookup hints. Until then, lookups count as enabled, and hints have no version.
+    /// Sets the source of facts about lookup hints. Until then, lookups count as enabled.
     void setLookupResources(std::weak_ptr<LookupResources> lookupResources);
 
     /// Returns a resource as of the last complete change. Does not block.

@@ -1,9 +1,11 @@
 #include "tavrind/DownloadResource.h"
 
 #include <algorithm>
+#include <vector>
 
 #include "CoreTavrin/TAVBag.h"
 #include "platform/values/Dictionary.h"
+#include "tavrind/TavrinLogging.h"
 
 namespace tavrin {
 
@@ -52,6 +54,22 @@ bool isResource(std::string_view identifier)
 bool isLookupResource(std::string_view identifier)
 {
     return identifier == kTAVLookupHintsWeekly || identifier == kTAVLookupHintsMonthly;
+}
+
+std::optional<std::string> signatureFromURL(const Url& url)
+{
+    const std::string path = url.path();
+    std::vector<std::string_view> elements;
+    for (std::size_t begin = 0; begin <= path.size();) {
+        const std::size_t end = std::min(path.find('/', begin), path.size());
+        elements.push_back(std::string_view(path).substr(begin, end - begin));
+        begin = end + 1;
+    }
+    if (elements.size() <= 4) {
+        log(kLogLookUp).error("invalid lookup hints url when processing signature: {}", url.string());
+        return std::nullopt;
+    }
+    return fmt::format("{}-{}-{}", elements[3], elements[4], elements[2]);
 }
 
 std::optional<std::string_view> downloadReason(const DownloadResource& resource, const Url& url, bool fileExists)

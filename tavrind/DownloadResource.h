@@ -34,6 +34,10 @@ using DownloadResources = std::map<std::string, DownloadResource, std::less<>>;
 /// their requests contain the location.
 [[nodiscard]] bool isLookupResource(std::string_view identifier);
 
+/// Returns the version of the lookup hints at a URL: "c-d-b" for a path that begins with /a/b/c/d. Logs a shorter
+/// path and returns nothing.
+[[nodiscard]] std::optional<std::string> signatureFromURL(const platform::Url& url);
+
 /// Returns why a resource that the bag lists at `url` must be downloaded: "update", "missing" or "lookup". Returns
 /// nothing if it need not be downloaded.
 [[nodiscard]] std::optional<std::string_view> downloadReason(const DownloadResource& resource, const platform::Url& url,

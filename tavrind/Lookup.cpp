@@ -163,22 +163,6 @@ bool Lookup::lookupEnabled() const
     return !_assembly.device.lookupDefaults.boolean("LookupSuggestionsDisabled");
 }
 
-std::optional<std::string> Lookup::signatureFromURL(const platform::Url& url) const
-{
-    const std::string path = url.path();
-    std::vector<std::string_view> elements;
-    for (std::size_t begin = 0; begin <= path.size();) {
-        const std::size_t end = std::min(path.find('/', begin), path.size());
-        elements.push_back(std::string_view(path).substr(begin, end - begin));
-        begin = end + 1;
-    }
-    if (elements.size() <= 4) {
-        log(kLogLookUp).error("invalid lookup hints url when processing signature: {}", url.string());
-        return std::nullopt;
-    }
-    return fmt::format("{}-{}-{}", elements[3], elements[4], elements[2]);
-}
-
 void Lookup::_drainQueue()
 {
     _queue->sync([] {});

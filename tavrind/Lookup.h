@@ -33,8 +33,6 @@ public:
 
     /// Returns true unless the shared setting "LookupSuggestionsDisabled" is true.
     [[nodiscard]] bool lookupEnabled() const override;
-    /// Returns "c-d-b" for a path that begins with /a/b/c/d. Logs a shorter path and returns nothing.
-    [[nodiscard]] std::optional<std::string> signatureFromURL(const platform::Url& url) const override;
 
     /// Filters a decoded answer, an array of result sets: removes the results whose "lookup_instructions" don't fit the
     /// text around the looked-up word. The reasons are that the keywords in the text weigh too little, that it does not

@@ -107,7 +107,7 @@ TEST_F(LookupTest, SignaturesComeFromThePathAndTheSharedSwitchCounts)
                                          {"https://r.example/a/b/c/", "c--b"},
                                          {"https://r.example/a/b/c", ""},
                                          {"https://r.example", ""}})
-        EXPECT_EQ(lookup.signatureFromURL(*Url::parse(url)).value_or(""), signature) << url;
+        EXPECT_EQ(signatureFromURL(*Url::parse(url)).value_or(""), signature) << url;
     EXPECT_EQ(log.count("invalid lookup hints url"), 2);
     EXPECT_TRUE(lookup.lookupEnabled());
     device.lookupDefaults.set("LookupSuggestionsDisabled", true);
