@@ -41,12 +41,12 @@ def sendable(text: str) -> str:
     return text.replace("\0", "\ufffd").encode("utf-8", "replace").decode()
 
 
-def result_record(result: Mapping[str, Any], query_id: int) -> records.ZRSearchResult:
-    """Returns the record of a result of the answer with this `query_id`."""
+def result_record(result: Mapping[str, Any]) -> records.ZRSearchResult:
+    """Returns the record of a result of an answer."""
     optional = {name: sendable(text_in(result, key)) or None for name, key in
                 [("identifier", "identifier"), ("sectionBundleIdentifier", "section_bundle_id"), ("resultBundleId", "bundle_id")]}
     return records.ZRSearchResult(
-        **optional, queryId=query_id, type=records.ResultType.TAVRIN, rankingScore=number_in(result, "score"),
+        **optional, type=records.ResultType.TAVRIN, rankingScore=number_in(result, "score"),
         title=records.ZRText(text=sendable(text_in(result, "title"))),
         punchout=records.ZRPunchout(urls=[sendable(address_in(result))]),
         customProperties=records.TAVCustomSearchResult(fbr=sendable(text_in(result, "fbr")) or None))
