@@ -41,7 +41,10 @@ bool ContentDecoder::feed(std::list<Stage>::iterator stage, std::string_view byt
     if (stage == _stages.end()) return sink(bytes);
     const auto next = std::next(stage);
     if (next == _stages.end()) return stage->feed(bytes, sink);
-    return stage->feed(bytes, [&](std::string_view decoded) { return feed(next, decoded, sink); });
+    return stage->feed(bytes, [&](std::string_view decoded) {
+        _between += decoded.size();
+        return _between <= kMaximumBetween && feed(next, decoded, sink);
+    });
 }
 
 bool ContentDecoder::finished() const

@@ -9,6 +9,7 @@
 
 #include <fmt/format.h>
 #include <gtest/gtest.h>
+#include <zlib.h>
 
 #include "platform/net/UrlRedirect.h"
 #include "platform/net/UrlSession.h"
@@ -44,6 +45,20 @@ const std::string kGzipHello("\x1f\x8b\x08\0\0\0\0\0\0\xff\x01\x05\0\xfa\xffhell
 /// The same with and without zlib's header.
 const std::string kZlibHello("\x78\x01\x01\x05\0\xfa\xffhello\x06\x2c\x02\x15", 16);
 const std::string kDeflateHello("\x01\x05\0\xfa\xffhello", 10);
+
+/// 70 MB of empty blocks of deflate, in 70 kB of deflate.
+std::string nothingPackedTwice()
+{
+    std::string blocks;
+    while (blocks.size() < 70'000'000) blocks.append("\0\0\0\xff\xff", 5);
+    uLongf size = compressBound(blocks.size());
+    std::string packed(size, '\0');
+    EXPECT_EQ(compress(reinterpret_cast<Bytef*>(packed.data()), &size, reinterpret_cast<const Bytef*>(blocks.data()),
+                       blocks.size()),
+              Z_OK);
+    packed.resize(size);
+    return packed;
+}
 
 // ---- answers ----
 
@@ -86,6 +101,7 @@ TEST_F(CurlLoaderTest, AnswersArriveWholeOrAsAnError)
         {"chunks above it", {chunked + "65\r\n" + hundred + "x\r\n0\r\n\r\n"}, kUrlTooLarge, "", 200, 100},
         {"small on the wire, larger unpacked", coded("gzip", kGzipHello), kUrlTooLarge, "", 200, 4},
         {"no body allowed", {httpAnswer(200, "x")}, kUrlTooLarge, "", 200, 0},
+        {"much between two codings", coded("deflate, deflate", nothingPackedTwice()), kUrlBadResponse},
         {"packed without end", coded("gzip", kGzipHello + hundred), kUrlTooLarge, "", 200, 100},
         {"a length nobody can send",
          {ok + "Content-Length: 9223372036854775807\r\n\r\nx", Then::Close},
