@@ -139,6 +139,9 @@ std::string mended(std::string_view text)
         } else if (const std::size_t digits = inString ? 0 : numberLength(text)) {
             length = digits;
             result += readableNumber(std::string(text.substr(0, length)));
+        } else if (const std::size_t run = inString ? 0 : text.find_first_not_of("+-.eE0123456789")) {
+            length = std::min(run, text.size()); // no number: taken whole, or each of its digits would be scanned again
+            result += text.substr(0, length);
         } else {
             if (inString && text.front() == '\\') length = std::min<std::size_t>(2, text.size());
             if (text.front() == '"') inString = !inString;
