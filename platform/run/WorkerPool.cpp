@@ -133,10 +133,11 @@ private:
         if (!_ended && !_armed && _events != 0) arm();
     }
 
-    /// Without EPOLLET the descriptor reports one event, and is armed again after the handler.
+    /// Without EPOLLET the descriptor reports one event, and is armed again after the handler. Without events it
+    /// reports the end of its peer, likewise once.
     void arm()
     {
-        const std::uint32_t events = _events == 0 || (_events & EPOLLET) != 0 ? _events : _events | EPOLLONESHOT;
+        const std::uint32_t events = (_events & EPOLLET) != 0 ? _events : _events | EPOLLONESHOT;
         const int operation = std::exchange(_added, true) ? EPOLL_CTL_MOD : EPOLL_CTL_ADD;
         _armed = true;
         if (!_crew.control(operation, _fd, events, _key))
