@@ -62,11 +62,12 @@ platform::UrlRequest TavrinURLRequestBuilder::createMutableUrlRequest() const
 
     platform::UrlComponents components = _urlComponents;
     components.setQueryItems(items);
-    if (auto query = components.percentEncodedQuery()) {
+    if (const auto query = components.percentEncodedQuery()) {
         // RFC 3986 allows ";" in a query, but some servers split the query there.
-        for (std::size_t at = query->find(';'); at != std::string::npos; at = query->find(';', at))
-            query->replace(at, 1, "%3B");
-        components.setPercentEncodedQuery(std::move(query));
+        std::string encoded;
+        encoded.reserve(query->size());
+        for (const char c : *query) c == ';' ? encoded += "%3B" : encoded += c;
+        components.setPercentEncodedQuery(std::move(encoded));
     }
 
     platform::UrlRequest request;
