@@ -6,8 +6,16 @@
 #include "tavrind/Assembly.h"
 #include "tavrind/QueueRanks.h"
 #include "tavrind/TavrinFeedback.h"
+#include "tavrind/TavrinLogging.h"
 
 namespace tavrin {
+
+namespace {
+
+/// Limit of sessions at a time: one for each user agent, which clients choose. Only as many can have a file.
+constexpr std::size_t kMaximumSessions = 2000;
+
+} // namespace
 
 ClientSessionShared::ClientSessionShared(Assembly& assembly, std::shared_ptr<TavrinFeedback> feedback,
                                          std::int64_t previousSessionEndReason, std::shared_ptr<void> call)
@@ -29,7 +37,11 @@ void ClientSessionShared::addFeedback(std::shared_ptr<TavrinFeedback> feedback, 
 {
     _sessionQueue->async([self = shared_from_this(), feedback = std::move(feedback), call = std::move(call)]() mutable {
         const auto found = self->_sessionMap.find(feedback->userAgent);
-        if (found == self->_sessionMap.end()) return self->_begin(std::move(feedback), std::move(call));
+        if (found == self->_sessionMap.end()) {
+            if (self->_sessionMap.size() < kMaximumSessions) return self->_begin(std::move(feedback), std::move(call));
+            log(kLogSession).error("{} user agents have a session, dropping an event of another", kMaximumSessions);
+            return self->_assembly.feedbackBooks.record(FeedbackFate::NoContainer);
+        }
         found->second->addFeedback(std::move(feedback), std::move(call));
     });
 }

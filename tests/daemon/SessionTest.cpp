@@ -1,6 +1,7 @@
 #include <algorithm>
 
 #include "tavrind/ClientSession.h"
+#include "tavrind/ClientSessionShared.h"
 #include "tavrind/TavrinUserGUIDController.h"
 #include "tests/support/FeedbackFixture.h"
 
@@ -311,6 +312,22 @@ TEST_F(SessionTest, AForeignGuidIsReportedInTheSession)
     ASSERT_EQ(uploaded["fb"].count(), 3u);
     const auto isError = [](const Value& event) { return event["type"] == Value("error"); };
     EXPECT_EQ(std::ranges::count_if(*uploaded["fb"].asArray(), isError), 1);
+    expectBooksClose();
+}
+
+TEST_F(SessionTest, SharedSessionsAreBounded)
+{
+    begin();
+    const auto of = [](int agent) {
+        return std::make_shared<TavrinFeedback>(std::make_shared<ZRFeedback>(), 0, "", std::to_string(agent));
+    };
+    const auto shared = std::make_shared<ClientSessionShared>(assembly(), of(0), 0, nullptr);
+    for (int agent = 1; agent <= 2001; ++agent) shared->addFeedback(of(agent), nullptr);
+    device.drain();
+    int sessions = 0;
+    shared->enumerateSessions([&](auto&, bool) { ++sessions; });
+    EXPECT_EQ(sessions, 2000);
+    EXPECT_EQ(booked(FeedbackFate::NoContainer), 2);
     expectBooksClose();
 }
 
