@@ -10,7 +10,7 @@ bool ImageFetches::join(const platform::Url& url, const ImageGroup& group)
     if (found == _entries.end()) return false;
     Entry& entry = found->second;
     if (!group) return true;
-    entry.groups.push_back(group);
+    if (entry.groups.empty() || entry.groups.back() != group) entry.groups.push_back(group); // a call may repeat a URL
     if (entry.turn && entry.lane == kAhead && _lanes[kAwaited].waiting < kWaiting) {
         _leaveTurn(entry);
         _wait(entry, kAwaited);

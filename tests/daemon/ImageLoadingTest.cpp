@@ -137,7 +137,8 @@ TEST_F(ImageFetchesTest, BeginInTurn)
     Strings added;
     for (std::size_t i = 0; i < ImageFetches::kUnderWay + 3; ++i) EXPECT_TRUE(add(added.emplace_back(on(i % 9, i))));
     EXPECT_EQ(begun(), Strings(added.begin(), added.end() - 3));
-    EXPECT_TRUE(join(added[0], client)) << "it is under way";
+    EXPECT_TRUE(join(added[0], client) && join(added[0], client)) << "it is under way";
+    EXPECT_EQ(client.use_count(), 2) << "listed once";
     EXPECT_TRUE(join(added.back(), nullptr)) << "nobody waits for it, so it stays where it is";
     EXPECT_FALSE(join("h1/x", client));
     EXPECT_TRUE(end("h1/x").empty() && end(added.back()).empty()) << "unknown, and not begun";
