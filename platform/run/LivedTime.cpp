@@ -82,7 +82,8 @@ LivedTime::LivedTime(Clock& clock, std::optional<Mark> saved) : _clock(&clock), 
 Duration LivedTime::now()
 {
     ClockReading reading = readingOf(*_clock);
-    _mark.lived += timePassed(_mark.clock, reading);
+    if (reading.bootTicks > _mark.clock.bootTicks) // a process lives in one boot, also if that has no identifier
+        _mark.lived += spanOf(reading.bootTicks - _mark.clock.bootTicks);
     _mark.clock = std::move(reading);
     return _mark.lived;
 }
