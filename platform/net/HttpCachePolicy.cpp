@@ -235,10 +235,10 @@ StoredResponse confirmed(StoredResponse stored, const UrlResponse& notModified, 
     HttpHeaders& headers = stored.response.headers;
     // The Age of the old response doesn't apply to the new one.
     headers.remove("Age");
+    HttpHeaders newer;
     for (const auto& [name, value] : notModified.headers)
-        if (!keepsItsOwn(name)) headers.remove(name);
-    for (const auto& [name, value] : notModified.headers)
-        if (!keepsItsOwn(name)) headers.add(name, value);
+        if (!keepsItsOwn(name)) newer.add(name, value);
+    headers.replaceBy(std::move(newer));
     stored.requested = requested;
     stored.received = received;
     return stored;

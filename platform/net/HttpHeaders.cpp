@@ -1,12 +1,19 @@
 #include "platform/net/HttpHeaders.h"
 
 #include <algorithm>
+#include <iterator>
+#include <set>
 
 #include "platform/net/UrlSession.h"
 
 namespace platform {
 
 namespace {
+
+char asciiLower(char c)
+{
+    return c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c;
+}
 
 auto named(std::string_view name)
 {
@@ -17,8 +24,7 @@ auto named(std::string_view name)
 
 bool equalIgnoringCase(std::string_view a, std::string_view b)
 {
-    const auto lower = [](char c) { return c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c; };
-    return std::ranges::equal(a, b, {}, lower, lower);
+    return std::ranges::equal(a, b, {}, asciiLower, asciiLower);
 }
 
 const std::string* HttpHeaders::find(std::string_view name) const
@@ -44,6 +50,18 @@ void HttpHeaders::set(std::string name, std::string value)
 void HttpHeaders::remove(std::string_view name)
 {
     std::erase_if(_entries, named(name));
+}
+
+void HttpHeaders::replaceBy(HttpHeaders others)
+{
+    // A service may send thousands of fields.
+    const auto precedes = [](std::string_view a, std::string_view b) {
+        return std::ranges::lexicographical_compare(a, b, {}, asciiLower, asciiLower);
+    };
+    std::set<std::string_view, decltype(precedes)> names(precedes);
+    for (const Entry& entry : others._entries) names.insert(entry.first);
+    std::erase_if(_entries, [&](const Entry& entry) { return names.contains(entry.first); });
+    std::ranges::move(others._entries, std::back_inserter(_entries));
 }
 
 } // namespace platform
