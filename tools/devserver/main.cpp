@@ -94,7 +94,7 @@ std::expected<void, std::string> run(const Options& options, const sigset_t& sig
         if (!options.quiet) {
             fmt::print(stderr,
                        "tavrin-devserver: {} entries; the bag is at {}/bag, the console at http://{}:{}/console\n"
-                       "  set SSL_CERT_FILE={} so that clients trust it; see docs/devserver.md\n",
+                       "  set SSL_CERT_FILE={} so that clients trust it; see tavrin-devserver(1)\n",
                        service.catalogue.entries().size(), base, host, *httpPort, certificate->certificate.string());
             service.onUpload = printUpload;
         }

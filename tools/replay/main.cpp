@@ -148,7 +148,7 @@ int main(int argc, char** argv)
         "latencies. The exit status is 1 if an answer was stale or failed.");
     app.set_version_flag("--version", "tavrin-replay " TAVRIND_VERSION);
     tools::useReadableHelp(app);
-    app.add_option("corpus", options.corpus, "Corpus file in the form of tools/replay/corpus.txt")->required();
+    app.add_option("corpus", options.corpus, "Corpus file, such as /usr/share/tavrin/corpus.txt")->required();
     tools::addConnectionOptions(app, options.address, options.identifier);
     CLI::Option* speed =
         app.add_option("--speed", options.speed, "Factor on the speed of the users")->capture_default_str();

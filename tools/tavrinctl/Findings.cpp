@@ -33,7 +33,9 @@ const std::map<std::string_view, std::pair<const char*, const char*>> kLimits{
     {"noContainer", {"sessions had no file", "Look at the disk and the directories above."}},
     {"refusedAppend",
      {"session files were full or could not be written", "Raise TAVSessionSizeLimit, or look at the disk."}},
-    {"fileTooBig", {"session files were too large to be read", "Lower TAVSessionSizeLimit."}},
+    {"fileTooBig",
+     {"session files were larger than TAVSessionSizeLimit, which was lowered",
+      "Run \"tavrinctl flush dump\" before you lower it."}},
     {"tooOld", {"session files were too old", "Nothing, if the device was off; TAVSessionMaxAge is the limit."}},
     {"unreadable", {"session files could not be read", "Look at the disk and the log."}},
     {"damagedTail", {"session files were damaged", "Look at the disk."}},
@@ -42,7 +44,8 @@ const std::map<std::string_view, std::pair<const char*, const char*>> kLimits{
     {"endpointUnset",
      {"the bag named no place to upload to", "Set \"feedbackURL\" or \"crowdsourcingURL\" in the bag."}},
     {"bufferFull",
-     {"too many records waited to be sent on their own", "The client sends too many; see docs/feedback.md."}},
+     {"too many records waited to be sent on their own",
+      "The client sends too many: at most 1,000, or 8 MiB, wait for an upload."}},
 };
 
 std::string said(const Value& value)
