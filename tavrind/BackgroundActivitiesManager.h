@@ -42,7 +42,7 @@ public:
     void insertFlushActivity(std::move_only_function<void()> callback);
     /// Replies with what a pass would upload, body by body (see `TavrinFeedbackFlusher::preview`), asynchronously. A
     /// body with "open" is of a session that has not ended, and grows until then. If the bodies exceed 8 MiB, those
-    /// that don't fit have their size under "bytes" instead. Changes nothing.
+    /// that don't fit have their size under "bytes" instead. Changes nothing but the count of files that are too large.
     void previewUploads(platform::Reply<platform::Value::Array> reply);
     /// While this is set, the background activity does nothing; passes on demand still run.
     [[nodiscard]] bool stopFlushing() const { return _stopFlushing; }

@@ -71,7 +71,7 @@ public:
     /// Removes the task and its files.
     [[nodiscard]] Result<void> forget(std::uint64_t identifier);
 
-    /// Opens an upload's body. Fails with EIO if the file's size is not `StoredTask::bodySize`.
+    /// Opens an upload's body. Fails with EBADMSG if the file's size is not `StoredTask::bodySize`.
     [[nodiscard]] Result<FileHandle> openBody(const StoredTask& task) const;
     /// Returns the path of a download's body.
     [[nodiscard]] std::filesystem::path downloadPath(std::uint64_t identifier) const;
