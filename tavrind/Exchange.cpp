@@ -228,6 +228,7 @@ void Exchange::_completed(std::optional<Bytes> data, std::optional<UrlResponse> 
 {
     const platform::Log& log = TavrinLogForCategory(_kind.logCategory);
     const int statusCode = response ? response->statusCode : 0;
+    _completedAt = _assembly.device.clock.hostTicks();
     if (response) recordSearchResult(statusCode);
     _count(_kind.name, _start->timestamp, error || statusCode < 200 || statusCode > 299);
     const std::size_t responseSize = data ? data->size() : 0;
@@ -320,7 +321,7 @@ void Exchange::_forceFetch(const UrlResponse& response)
 
 void Exchange::_addFeedback(std::shared_ptr<ZRFeedback> record, std::uint64_t clientQueryId)
 {
-    record->timestamp = _assembly.device.clock.hostTicks();
+    if (record->timestamp == 0) record->timestamp = _assembly.device.clock.hostTicks();
     if (const auto manager = _client->sessionManager())
         manager->addTavrinFeedback(std::make_shared<TavrinFeedback>(std::move(record), _request->queryId, "",
                                                                     _view.userAgent.value_or(""), clientQueryId));
@@ -367,6 +368,7 @@ void Exchange::endNetworkFeedback(const JsonDocument* rawResponse, std::size_t r
     } else {
         record = std::make_shared<ZREndNetworkSearchFeedback>(_start, responseSize, statusCode, timingData);
     }
+    record->timestamp = _completedAt; // a client may report what it shows before this runs
     _addFeedback(std::move(record), 0);
 }
 
