@@ -109,7 +109,8 @@ void ClientStateManager::loadState()
                 continue;
             if (stateCache.size() >= kMaximumStates) break;
             auto state = std::make_shared<ClientState>(*identifier, _assembly);
-            if (const std::string* agent = session["agent"].asString()) state->setUserAgent(*agent);
+            const std::string* agent = session["agent"].asString();
+            if (agent && agent->size() <= TAVSessionConfiguration::kMaximumName) state->setUserAgent(*agent);
             stateCache[*identifier] = std::move(state);
         }
     });

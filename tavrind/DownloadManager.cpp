@@ -52,6 +52,13 @@ void logTaskError(const std::string& reason)
         .error("download task error {}", makeTAVError(TAVErrorInvalidResponse, reason).description());
 }
 
+void logUnknown(const std::string& identifier, const UrlRequest& request)
+{
+    log(kLogDownloadManager)
+        .error("could not find resource for download identifier: {} url: {}", identifier, request.url.string());
+    logTaskError(fmt::format("can't find {}", identifier));
+}
+
 } // namespace
 
 std::shared_ptr<DownloadManager> DownloadManager::make(Assembly& assembly)
@@ -337,7 +344,7 @@ void DownloadManager::taskDidFinishDownloading(const std::shared_ptr<platform::B
     if (!isResource(identifier)) {
         log(kLogDownloadManager)
             .error("failed to find download for identifier: {} url: {}", identifier, request.url.string());
-        return logTaskError(fmt::format("can't find {}", identifier));
+        return logUnknown(identifier, request);
     }
     const auto path = _pathToResource(identifier);
     if (!path) return log(kLogDownloadManager).error("failed getting destination URL for {}", identifier);
@@ -370,11 +377,7 @@ void DownloadManager::_noteReceived(const std::string& identifier, const Value& 
 {
     _queue->assertOnQueue();
     const auto found = _resources.find(identifier);
-    if (found == _resources.end()) { // no longer in the bag, or deleted after a move
-        log(kLogDownloadManager)
-            .error("could not find resource for download identifier: {} url: {}", identifier, request.url.string());
-        return logTaskError(fmt::format("can't find {}", identifier));
-    }
+    if (found == _resources.end()) return logUnknown(identifier, request); // not in the bag, or deleted after a move
     DownloadResource& resource = found->second;
     resource.url = note.asString() ? Url::parse(*note.asString()) : std::nullopt;
     if (response.url != request.url)

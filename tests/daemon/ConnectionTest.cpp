@@ -190,6 +190,16 @@ TEST_F(ConnectionTest, TheRegistryPersistsOnlyWhenAskedTo)
     EXPECT_TRUE(assembly().clientStateManager->sessions().empty());
     EXPECT_TRUE(assembly().clientStateManager->stateForClientIdentifier("i")->sessionManager())
         << "restored before there was one";
+
+    Value::Array many{Value::dictionaryOf({{"identifier", std::string(1025, 'i')}, {"agent", "x"}})};
+    for (int i = 0; i < 1025; ++i)
+        many.emplace_back(Value::dictionaryOf({{"identifier", "i" + std::to_string(i)}, {"agent", "x"}}));
+    many[1].mutableDictionary().set("agent", std::string(1025, 'x'));
+    device.userDefaults.set("sessions", std::move(many));
+    start();
+    const Value::Array restored = assembly().clientStateManager->sessions();
+    EXPECT_EQ(restored.size(), 1023u) << "1,024 clients, one without its agent";
+    EXPECT_EQ(restored.front()["identifier"], Value("i1"));
 }
 
 TEST_F(ConnectionTest, TheEndpointServesMoreResultsAndCardsAlone)

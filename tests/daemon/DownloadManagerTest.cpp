@@ -284,6 +284,18 @@ TEST_F(DownloadManagerTest, WhatTheBagNoLongerListsIsDeleted)
     EXPECT_EQ(told.size(), 1u) << "a failed fetch changes nothing";
 }
 
+TEST_F(DownloadManagerTest, AnUnknownResourceOfAnotherVersionIsLogged)
+{
+    platform::UrlRequest request{.url = *urlOf("https://r.example/gone")};
+    request.headers.set("X-Quorvane-Download-Identifier", "TAVGone");
+    assembly.downloadURLSession->downloadTask(request).value()->resume();
+    deliver(200, "x");
+    for (const char* line : {"failed to find download for identifier: TAVGone",
+                             "could not find resource for download identifier: TAVGone", "can't find TAVGone"})
+        EXPECT_EQ(log.count(line), 1) << line;
+    EXPECT_EQ(contents("TAVGone"), "(none)");
+}
+
 TEST_F(DownloadManagerTest, LookupHintsFollowTheBagTheirRedirectAndTheLocation)
 {
     bag({});

@@ -172,6 +172,14 @@ TEST_F(QueryCacheTest, ExpiredSetsAreDroppedWhenTheyAreFound)
     EXPECT_EQ(get("we"), "web");
 }
 
+TEST_F(QueryCacheTest, ScalesAreComparedAsTheyAreSent)
+{
+    put("wea", {{"query", "weather"}}, 1.7);
+    EXPECT_EQ(get("weat", 1.75), "") << "sent as 1.8";
+    put("wea", {{"query", "weather"}}, 1.75);
+    EXPECT_EQ(get("weat", 1.75), "weather");
+}
+
 TEST_F(QueryCacheTest, KeepsToItsCost)
 {
     platform::test::LogCapture log;

@@ -273,7 +273,7 @@ TEST_F(RequestFactoryTest, ALookupSaysWhatIsKnownOfIt)
 {
     using Type = LookupSelectionType;
     const char* english = "The quick brown fox jumps over the lazy dog and runs away through the forest";
-    std::string japanese = "aa"; // so that no multiple of 1,024 bytes ends with a character
+    std::string japanese = "aa"; // so that 4,096 bytes end within a character
     while (japanese.size() < 6000) japanese += "東京の天気予報を調べています。";
     const struct {
         std::string words;

@@ -112,6 +112,10 @@ TEST(LivedTime, AMarkReadsBackAndOneFromADamagedFileStillCounts)
     clock.suspend(1h);
     const LivedTime::Mark mark = running.mark();
     EXPECT_EQ(mark.lived, 1h);
+    clock.hasBootId = false;
+    clock.suspend(5s);
+    EXPECT_EQ(running.now(), 1h + 5s) << "a process lives in one boot";
+    clock.hasBootId = true;
     EXPECT_EQ(LivedTime::Mark::parse(mark.text()), mark);
     for (const char* broken : {"", "1", "1 2", "1 2 3", "x 2 3 b", "1 2 -3 b"})
         EXPECT_FALSE(LivedTime::Mark::parse(broken)) << broken;

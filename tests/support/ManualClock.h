@@ -10,6 +10,8 @@ namespace platform::test {
 /// A clock that a test moves by hand. It starts on 2026-01-01 00:00 UTC, one hour after the device woke.
 class ManualClock final : public Clock {
 public:
+    bool hasBootId = true;
+
     [[nodiscard]] Date wallNow() const override
     {
         std::lock_guard lock(_mutex);
@@ -28,7 +30,7 @@ public:
     [[nodiscard]] std::string bootId() const override
     {
         std::lock_guard lock(_mutex);
-        return "boot " + std::to_string(_boots);
+        return hasBootId ? "boot " + std::to_string(_boots) : "";
     }
     TimerId after(Duration delay, std::move_only_function<void()> fire) override
     {
