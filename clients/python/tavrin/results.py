@@ -41,12 +41,12 @@ def sendable(text: str) -> str:
     return text.replace("\0", "\ufffd").encode("utf-8", "replace").decode()
 
 
-def result_record(result: Mapping[str, Any]) -> records.ZRSearchResult:
-    """Returns the record of a result of an answer."""
+def result_record(result: Mapping[str, Any], client_query_id: int = 0) -> records.ZRSearchResult:
+    """Returns the record of a result of an answer. `client_query_id` is the number that the client gave the search."""
     optional = {name: sendable(text_in(result, key)) or None for name, key in
                 [("identifier", "identifier"), ("sectionBundleIdentifier", "section_bundle_id"), ("resultBundleId", "bundle_id")]}
     return records.ZRSearchResult(
-        **optional, type=records.ResultType.TAVRIN, rankingScore=number_in(result, "score"),
+        **optional, queryId=client_query_id, type=records.ResultType.TAVRIN, rankingScore=number_in(result, "score"),
         title=records.ZRText(text=sendable(text_in(result, "title"))),
         punchout=records.ZRPunchout(urls=[sendable(address_in(result))]),
         customProperties=records.TAVCustomSearchResult(fbr=sendable(text_in(result, "fbr")) or None))
