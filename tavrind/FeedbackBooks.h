@@ -28,7 +28,7 @@ enum class FeedbackFate : std::uint8_t {
     Unknown,   ///< pending when an earlier process ended, and not found since
     // The rest are reasons for a drop.
     FeedbackOff,   ///< the bag disables feedback
-    NoContainer,   ///< the session has no file
+    NoContainer,   ///< the session has no file, or there are too many sessions
     RefusedAppend, ///< it did not fit into the session's file or could not be written
     FileTooBig,    ///< the session's file was too large to be read
     TooOld,        ///< the session's file was too old

@@ -30,7 +30,9 @@ constexpr const char* kRestart = "systemctl --user restart tavrind";
 
 /// Why events were dropped, and what to do about it. Reasons that are not here are intended.
 const std::map<std::string_view, std::pair<const char*, const char*>> kLimits{
-    {"noContainer", {"sessions had no file", "Look at the disk and the directories above."}},
+    {"noContainer",
+     {"sessions had no file",
+      "Look at the disk and the directories above, and for clients that change their user agent."}},
     {"refusedAppend",
      {"session files were full or could not be written", "Raise TAVSessionSizeLimit, or look at the disk."}},
     {"fileTooBig",
