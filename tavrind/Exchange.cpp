@@ -174,17 +174,16 @@ void Exchange::_send()
         log.log("Dispatching network request for {}", _kind.name);
 
     const auto guids = _client->guidController();
+    // Only for a request that is about to be built: reading the GUID may replace it, which empties query caches.
     if (guids) {
-        (void)guids->currentUserGUID();   // replaces an expired GUID
-        (void)guids->lastKnownUserGUID(); // returns after that has emptied the query caches
+        (void)guids->currentUserGUID();
+        (void)guids->lastKnownUserGUID(); // returns after they were emptied
     }
     // If the cache is emptied after this point, the answer belongs to an earlier state and is not cached.
     if (const auto& cache = _client->queryCache()) _cacheGeneration = cache->generation();
     _view = _client->view();
     const double timeout = _view.configuration ? _view.configuration->timeoutIntervalForRequest : 0;
     const std::string userAgent = _view.userAgent.value_or("");
-    // Reading the GUID may replace it, which empties query caches. So it is only read for a request that is about to be
-    // built.
     const platform::Uuid userGuid = guids ? guids->currentUserGUID() : platform::Uuid();
     const ClientRequest parts{.request = *_request,
                               .bag = _view.bag.get(),

@@ -73,7 +73,7 @@ private:
 
     std::uint64_t _begun = 0;           // in host ticks
     std::uint64_t _completedAt = 0;     // likewise: the end of the network request
-    ClientView _view;                   // the client after the wait for the bag
+    ClientView _view;                   // the client after the wait for the bag; read again before the request is built
     std::uint64_t _cacheGeneration = 0; // of the query cache, before the request was built
     platform::UrlRequest _httpRequest;  // as sent
     std::shared_ptr<ZRStartNetworkSearchFeedback> _start;

@@ -66,7 +66,12 @@ platform::UrlRequest TavrinURLRequestBuilder::createMutableUrlRequest() const
         // RFC 3986 allows ";" in a query, but some servers split the query there.
         std::string encoded;
         encoded.reserve(query->size());
-        for (const char c : *query) c == ';' ? encoded += "%3B" : encoded += c;
+        for (const char c : *query) {
+            if (c == ';')
+                encoded += "%3B";
+            else
+                encoded += c;
+        }
         components.setPercentEncodedQuery(std::move(encoded));
     }
 

@@ -28,7 +28,7 @@ public:
 
     /// Returns the GUID, and replaces it first if it has expired.
     [[nodiscard]] platform::Uuid currentUserGUID();
-    /// Returns the GUID even if it has expired, for previews.
+    /// Returns the GUID even if it has expired. Returns after earlier replacements were posted.
     [[nodiscard]] platform::Uuid lastKnownUserGUID();
     /// Replaces the GUID before the next read.
     void reset();

@@ -28,7 +28,7 @@ public:
     /// Appends a field; keeps others of that name.
     void add(std::string name, std::string value) { _entries.emplace_back(std::move(name), std::move(value)); }
     void remove(std::string_view name);
-    /// Replaces the fields of the names in `others`, which may repeat names, by those.
+    /// Removes all fields that have a name of `others`, then appends `others`, whose names may repeat.
     void replaceBy(HttpHeaders others);
 
     [[nodiscard]] auto begin() const { return _entries.begin(); }
