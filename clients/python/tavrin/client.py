@@ -61,8 +61,7 @@ class Answer:
 
     @cached_property
     def sets(self) -> list[dict[str, Any]]:
-        values = json.loads(self.raw) if self.raw else None
-        return _dictionaries(values)
+        return _dictionaries(_json(self.raw))
 
     @property
     def results(self) -> list[dict[str, Any]]:
@@ -92,7 +91,7 @@ class Bag:
     @cached_property
     def values(self) -> dict[str, Any]:
         """All keys, as the service sent them; the object under "clients" overrides them for some clients."""
-        values = json.loads(self.raw) if self.raw else None
+        values = _json(self.raw)
         return values if isinstance(values, dict) else {}
 
     @property
@@ -331,6 +330,12 @@ class Client:
             if self._endpoint is None or self._endpoint.lost:
                 self._endpoint = await Connection.open(self._endpoint_address)
             return self._endpoint
+
+
+def _json(raw: bytes | None) -> Any:
+    """Reads the service's JSON. Numbers that can't have 64 bits become floats, infinite ones if need be: an int of more than 4,300
+    digits would be an error."""
+    return json.loads(raw, parse_int=lambda text: int(text) if len(text) <= 20 else float(text)) if raw else None
 
 
 def _dictionaries(values: Any) -> list[dict[str, Any]]:
