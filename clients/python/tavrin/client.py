@@ -151,7 +151,7 @@ class Client:
 
     @property
     def is_connected(self) -> bool:
-        return self._connection is not None and not self._connection.lost
+        return self._connection is not None and self._connection.is_open
 
     # ---- Requests
 
@@ -309,7 +309,7 @@ class Client:
         async with self._connecting:
             if self._closed:
                 raise DaemonAway("the client is closed")
-            if self._connection is None or self._connection.lost:
+            if self._connection is None or not self._connection.is_open:
                 connection = await Connection.open(self.address, self._pushed)
                 try:
                     self._endpoint_address, = await connection.call(DAEMON, "Configure", "a{sv}", self._configuration,
@@ -327,7 +327,7 @@ class Client:
                 raise DaemonAway("the client is closed")
             if not self._endpoint_address:
                 raise DaemonAway("the daemon can't create the socket for this; its log says why. Connect again once that is mended")
-            if self._endpoint is None or self._endpoint.lost:
+            if self._endpoint is None or not self._endpoint.is_open:
                 self._endpoint = await Connection.open(self._endpoint_address)
             return self._endpoint
 

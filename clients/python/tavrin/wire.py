@@ -3,6 +3,7 @@ from __future__ import annotations
 
 import asyncio
 import itertools
+import select
 import urllib.parse
 from collections.abc import Callable, Mapping, Sequence
 from typing import Any
@@ -94,6 +95,8 @@ class Connection:
         self._serials = itertools.count(1)
         self._pending: dict[int, asyncio.Future[Message]] = {}
         self._receiver: asyncio.Task[None] | None = None
+        self._hangup = select.poll()
+        self._hangup.register(writer.get_extra_info("socket"), select.POLLRDHUP)
 
     @classmethod
     async def open(cls, address: str, on_signal: Callable[[str, tuple], None] | None = None) -> Connection:
@@ -117,6 +120,11 @@ class Connection:
         connection = cls(reader, writer, on_signal)
         connection._receiver = asyncio.create_task(connection._receive())
         return connection
+
+    @property
+    def is_open(self) -> bool:
+        """False once the daemon has gone, even if the loop has not run since and `lost` is not set yet."""
+        return not self.lost and not self._hangup.poll(0)
 
     async def close(self) -> None:
         """Ends the connection. May be called twice."""
