@@ -12,7 +12,7 @@ from dataclasses import dataclass
 from functools import cached_property
 from typing import Any, TypedDict, Unpack
 
-from .errors import DaemonAway, RequestFailed
+from .errors import DaemonAway, RequestFailed, TavrinError
 from .records import LookupSelectionType, Record, StartSearchTrigger
 from .wire import Connection, entries
 
@@ -124,6 +124,7 @@ class Client:
         self._bag: Bag | None = None
         self._bag_listeners: list[Callable[[Bag | None], None]] = []
         self._connecting = asyncio.Lock()  # passes callers in order, so that calls keep theirs
+        self._failure: TavrinError | None = None  # of the last attempt to connect
         self._connection: Connection | None = None
         self._endpoint_address = ""
         self._endpoint: Connection | None = None
@@ -306,19 +307,29 @@ class Client:
     # ---- Connections
 
     async def _connected(self) -> Connection:
+        failure = self._failure
         async with self._connecting:
             if self._closed:
                 raise DaemonAway("the client is closed")
             if self._connection is None or not self._connection.is_open:
-                connection = await Connection.open(self.address, self._pushed)
+                if self._failure and self._failure is not failure:  # what this call waited for; to try again may take as long
+                    raise self._failure
                 try:
-                    self._endpoint_address, = await connection.call(DAEMON, "Configure", "a{sv}", self._configuration,
-                                                                    timeout=self._answer_timeout)
-                except BaseException:
-                    await connection.close()
+                    self._connection = await self._connect()
+                except TavrinError as problem:
+                    self._failure = problem
                     raise
-                self._connection = connection
             return self._connection
+
+    async def _connect(self) -> Connection:
+        connection = await Connection.open(self.address, self._pushed)
+        try:
+            self._endpoint_address, = await connection.call(DAEMON, "Configure", "a{sv}", self._configuration,
+                                                            timeout=self._answer_timeout)
+        except BaseException:
+            await connection.close()
+            raise
+        return connection
 
     async def _connected_endpoint(self) -> Connection:
         await self._connected()
