@@ -142,11 +142,10 @@ class Client:
         await self._connected()
 
     async def close(self) -> None:
-        """Ends the connection. Further calls raise `DaemonAway`."""
+        """Ends the connection. Further calls raise `DaemonAway`; so does one that is connecting, when its attempt ends."""
         self._closed = True
-        async with self._connecting:
-            for connection in filter(None, (self._connection, self._endpoint)):
-                await connection.close()
+        for connection in filter(None, (self._connection, self._endpoint)):
+            await connection.close()
         for listener in list(self._bag_listeners):
             listener(None)
 
@@ -326,6 +325,8 @@ class Client:
         try:
             self._endpoint_address, = await connection.call(DAEMON, "Configure", "a{sv}", self._configuration,
                                                             timeout=self._answer_timeout)
+            if self._closed:
+                raise DaemonAway("the client is closed")
         except BaseException:
             await connection.close()
             raise
@@ -340,6 +341,8 @@ class Client:
                 raise DaemonAway("the daemon can't create the socket for this; its log says why. Connect again once that is mended")
             if self._endpoint is None or not self._endpoint.is_open:
                 self._endpoint = await Connection.open(self._endpoint_address)
+                if self._closed:
+                    await self._endpoint.close()
             return self._endpoint
 
 
