@@ -246,7 +246,8 @@ class Client:
     def on_bag(self, callback: Callable[[Bag], None]) -> Callable[[], None]:
         """Calls back with every bag that the daemon sends, and with the last one at once if there is one.
 
-        Returns a function that ends it.
+        After a restart of the daemon there are bags again from the client's next call on: a program that only listens calls
+        `connect` from time to time. Returns a function that ends it.
         """
         def listener(bag: Bag | None) -> None:
             if bag:
@@ -254,7 +255,10 @@ class Client:
         return self._listen(listener)
 
     async def bags(self) -> AsyncIterator[Bag]:
-        """Yields the bag whenever the daemon sends one; a reader that is slow gets the newest. Ends with `close`."""
+        """Yields the bag whenever the daemon sends one; a reader that is slow gets the newest. Ends with `close`.
+
+        After a restart of the daemon it goes on with the client's next call, as `on_bag` does.
+        """
         newest: asyncio.Queue[Bag | None] = asyncio.Queue(1)
 
         def listener(bag: Bag | None) -> None:
