@@ -12,7 +12,7 @@ import functools
 import inspect
 from typing import Any
 
-from . import client
+from . import client, errors
 
 
 class Client:
@@ -22,6 +22,7 @@ class Client:
     """
 
     def __init__(self, *arguments: Any, **options: Any):
+        self._closed = False
         self._runner = asyncio.Runner()
         try:
             self._client = self._runner.run(_make(*arguments, **options))
@@ -42,10 +43,16 @@ class Client:
 
         @functools.wraps(member)
         def blocking(*arguments: Any, **options: Any) -> Any:
+            if self._closed:
+                raise errors.DaemonAway("the client is closed")
             return self._runner.run(member(*arguments, **options))
         return blocking
 
     def close(self) -> None:
+        """Ends the connection. Further calls raise `DaemonAway`. May be called twice."""
+        if self._closed:
+            return
+        self._closed = True
         self._runner.run(self._client.close())
         self._runner.close()
 
