@@ -34,7 +34,7 @@ class Service(http.server.BaseHTTPRequestHandler):
 
     def do_POST(self):
         try:  # DEFLATE without a header
-            text = zlib.decompressobj(-15).decompress(self.rfile.read(int(self.headers["Content-Length"])), 32 << 20)
+            text = zlib.decompressobj(-15).decompress(self.rfile.read(max(int(self.headers["Content-Length"]), 0)), 32 << 20)
             digest = hashlib.sha512(text).hexdigest()
             accepted = digest == self.headers["X-Quorvane-Digest"] and "fb" in json.loads(text)
         except (TypeError, ValueError, zlib.error):
