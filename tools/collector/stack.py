@@ -16,6 +16,7 @@ import shutil
 import signal
 import socket
 import subprocess
+import sys
 import tempfile
 import threading
 
@@ -37,6 +38,13 @@ class Stack:
         if os.geteuid() == 0:
             self._as_store = ["setpriv", "--reuid=postgres", "--regid=postgres", "--clear-groups"]
         self._ended, self._lock, self._parts, self._threads = threading.Event(), threading.Lock(), {}, []
+        try:
+            self._start(program, origin, certificate, key)
+        except BaseException:
+            self.end()
+            raise
+
+    def _start(self, program, origin, certificate, key):
         port, accept = free_port(), free_port()
         self.https = f"https://127.0.0.1:{port}"
         (self.directory / "queue").mkdir()
@@ -74,16 +82,18 @@ class Stack:
         """Starts a part, and starts it again when it ends."""
         def start():
             with self._lock, open(self.directory / "parts.log", "ab") as log:
-                if not self._ended.is_set():
-                    self._parts[name] = subprocess.Popen(command, stdout=log, stderr=log, cwd="/", process_group=0)
+                if self._ended.is_set():
+                    return None
+                self._parts[name] = subprocess.Popen(command, stdout=log, stderr=log, cwd="/", process_group=0)
+                return self._parts[name]
 
         def run():
-            while not self._ended.is_set():
-                start()
-                self._parts[name].wait()
+            while part := start():
+                part.wait()
                 self._ended.wait(0.2)
-        self._threads.append(threading.Thread(target=run))
-        self._threads[-1].start()
+        thread = threading.Thread(target=run)
+        thread.start()
+        self._threads.append(thread)
 
     def kill(self, name):
         """The end of a part and of its processes, without a warning."""
@@ -120,10 +130,12 @@ if __name__ == "__main__":
         parser.add_argument("--" + option, required=True)
     parser.add_argument("--build", type=pathlib.Path, default=HERE.parents[1] / "build/dev")
     options = parser.parse_args()
+    for number in (signal.SIGINT, signal.SIGTERM):
+        signal.signal(number, lambda *_: sys.exit())
     stack = Stack(options.build.resolve() / "tools/collector/tavrin-collector", options.origin,
                   os.path.abspath(options.certificate), os.path.abspath(options.key))
     try:
         print(f"{stack.https}/feedback takes uploads; psql '{stack.database}' has them", flush=True)
-        signal.sigwait({signal.SIGINT, signal.SIGTERM})
+        signal.pause()
     finally:
         stack.end()
