@@ -78,10 +78,12 @@ Result<Sqlite> Sqlite::open(const std::filesystem::path& path, Access access)
     }
     if (access == Access::Shared) sqlite3_busy_timeout(database, kPatience);
     if (access != Access::Exclusive) return result;
-    // The write-ahead log of an exclusive database needs no shared memory and costs one sync a transaction.
+    // The write-ahead log of an exclusive database needs no shared memory and costs one sync a transaction. If SQLite
+    // can't open it for writing, it opens it for reading, and all later writes fail; the empty transaction notices
+    // that.
     if (auto set =
             result.execute("PRAGMA locking_mode = EXCLUSIVE; PRAGMA journal_mode = WAL; PRAGMA synchronous = FULL;"
-                           "PRAGMA wal_autocheckpoint = 256; PRAGMA cache_size = -512");
+                           "PRAGMA wal_autocheckpoint = 256; PRAGMA cache_size = -512; BEGIN IMMEDIATE; COMMIT");
         !set)
         return std::unexpected(std::move(set.error()));
     return result;
