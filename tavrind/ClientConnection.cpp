@@ -230,8 +230,7 @@ void ClientConnection::reportEvent(std::shared_ptr<ZRFeedback> feedback, std::in
         return log(kLogFeedback).error("state must not be nil");
     }
     if (auto custom = std::dynamic_pointer_cast<ZRCustomFeedback>(feedback)) {
-        return handleCustomFeedback(std::move(custom), queryId,
-                                    [] { log(kLogFlusher).log("flushed custom feedback"); });
+        return handleCustomFeedback(std::move(custom), queryId, std::move(call));
     }
     if (const auto* appear = dynamic_cast<const ZRSearchViewAppearFeedback*>(feedback.get())) {
         if (!appear->isOnLockScreen &&
@@ -259,17 +258,20 @@ void ClientConnection::reportEvent(std::shared_ptr<ZRFeedback> feedback, std::in
 }
 
 void ClientConnection::handleCustomFeedback(std::shared_ptr<ZRCustomFeedback> feedback, std::int64_t queryId,
-                                            std::move_only_function<void()> callback)
+                                            std::shared_ptr<void> call)
 {
+    // The callback keeps the call, so that the record counts as a message of its client until it is in the buffer.
+    const auto callback = [call] { log(kLogFlusher).log("flushed custom feedback"); };
     switch (feedback->feedbackType) {
     case CustomFeedbackType::WendralAutofill:
     case CustomFeedbackType::VistrelResultFeatures:
-        ClientSession(_assembly, std::make_shared<TavrinFeedback>(std::move(feedback), queryId, "", userAgent()))
+        ClientSession(_assembly, std::make_shared<TavrinFeedback>(std::move(feedback), queryId, "", userAgent()),
+                      std::move(call))
             .sessionComplete();
         return callback();
     case CustomFeedbackType::Crowdsourcing:
         _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.dp.submit");
-        return _assembly.crowdsourcingFeedbackFlusher->flush(std::move(feedback), std::move(callback));
+        return _assembly.crowdsourcingFeedbackFlusher->flush(std::move(feedback), callback);
     default:
         log(kLogFeedback)
             .info("custom feedback of type {} is not served", static_cast<std::int64_t>(feedback->feedbackType));

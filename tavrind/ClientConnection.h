@@ -65,7 +65,7 @@ private:
     void search(ClientState& state, const RequestKind& kind, std::shared_ptr<TAVRequest> request, RequestReply reply);
     void reportEvent(std::shared_ptr<ZRFeedback> feedback, std::int64_t queryId, std::shared_ptr<void> call);
     void handleCustomFeedback(std::shared_ptr<ZRCustomFeedback> feedback, std::int64_t queryId,
-                              std::move_only_function<void()> callback);
+                              std::shared_ptr<void> call);
     void _reportOneOff(const platform::Error& error) const;
     void bagChangeNotification(std::shared_ptr<const TAVBag> bag);
 

@@ -63,8 +63,8 @@ ClientSession::ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback>
     : ClientSession(assembly, std::move(feedback), previousSessionEndReason, std::move(call), FileUse::Session)
 {}
 
-ClientSession::ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback> feedback)
-    : ClientSession(assembly, std::move(feedback), 0, nullptr, FileUse::OneOff)
+ClientSession::ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call)
+    : ClientSession(assembly, std::move(feedback), 0, std::move(call), FileUse::OneOff)
 {}
 
 ClientSession::ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback> feedback,

@@ -48,7 +48,7 @@ public:
     ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback> feedback, std::int64_t previousSessionEndReason,
                   std::shared_ptr<void> call = {});
     /// Begins a one-off session: `feedback` is its only record, and the caller completes it.
-    ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback> feedback);
+    ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call = {});
     ~ClientSession() override;
 
     void addFeedback(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call = {}) override;
