@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cctype>
+#include <ranges>
 
 #include <fmt/format.h>
 
@@ -41,6 +42,9 @@ constexpr double kStaleAheadSeconds = 600;
 /// Seconds by which the clock may be set back before a fresh bag counts as expired.
 constexpr double kClockTolerance = 1;
 constexpr std::size_t kMaximumBagSize = 8u << 20;
+/// Limit of values in a bag: the time to write its property list grows with their square.
+constexpr std::size_t kMaximumBagValues = 1u << 14;
+constexpr std::size_t kLoggedProblems = 20;
 /// Time limit of a fetch with its retries. Without it, a hanging fetch would prevent all others.
 constexpr platform::Duration kFetchLimit = std::chrono::minutes(2);
 constexpr platform::Duration kFirstAnnouncementInterval = std::chrono::minutes(1);
@@ -307,7 +311,11 @@ Value TavrinBagController::cacheBagDictionary(const Value& fetched, const std::s
 void TavrinBagController::cacheBagState(std::shared_ptr<const TAVBag> bag, bool fromDisk)
 {
     if (!bag) return;
-    for (const std::string& problem : bag->problems()) log(kLogBag).error("bag: {}; using the default", problem);
+    const std::vector<std::string> problems = bag->problems();
+    for (const std::string& problem : problems | std::views::take(kLoggedProblems))
+        log(kLogBag).error("bag: {}; using the default", problem);
+    if (problems.size() > kLoggedProblems)
+        log(kLogBag).error("bag: {} further entries are wrong", problems.size() - kLoggedProblems);
     enum : unsigned long { kDisabled, kEnabled, kUnknown };
     const auto newsState = [](const TAVBag* some) -> unsigned long {
         return !some ? kUnknown : TAVBag(some->rawBag(), kNewsUserAgent).isEnabled() ? kEnabled : kDisabled;
@@ -406,15 +414,16 @@ void TavrinBagController::_fetchCompleted(Fetch& fetch, std::optional<platform::
     } else if (statusCode != 200) {
         log(kLogBag).error("Error fetching bag status code: {}", statusCode);
         error = makeTAVError(TAVErrorBagFetch, fmt::format("statusCode {}", statusCode));
-    } else if (auto parsed = platform::parseJson(data->view(), kMaximumBagSize); !parsed) {
-        log(kLogBag).error("error parsing bag json {}", parsed.error().description());
-        error = parsed.error();
-    } else if (!parsed->asDictionary()) {
+    } else if (auto document = platform::JsonDocument::parse(data->view(), kMaximumBagSize, kMaximumBagValues);
+               !document) {
+        log(kLogBag).error("error parsing bag json {}", document.error().description());
+        error = document.error();
+    } else if (const Value parsed = document->root().value(); !parsed.asDictionary()) {
         log(kLogBag).error("Error fetching bag: returned data was not of the expected type.");
         error = makeTAVError(TAVErrorBagFetch, "not JSON object");
     } else {
-        log(kLogBag).log("Got bag: {}", platform::toJson(*parsed));
-        bag = std::make_shared<const TAVBag>(cacheBagDictionary(*parsed, fetch.cacheUrl), _userAgent);
+        log(kLogBag).log("Got bag: {}", platform::toJson(parsed));
+        bag = std::make_shared<const TAVBag>(cacheBagDictionary(parsed, fetch.cacheUrl), _userAgent);
         cacheBagState(bag, false);
         _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.bag.fetches");
     }

@@ -128,6 +128,7 @@ TEST_F(BagControllerTest, FailedFetchesLeaveTheOldBag)
         {[&] { lastTask()->respond(200, "{"); }, nullptr, 0},
         {[&] { lastTask()->respond(200, ""); }, nullptr, 0},
         {[&] { lastTask()->respond(200, std::string(10000, '[')); }, nullptr, 0},
+        {[&] { lastTask()->respond(200, platform::toJson(Dictionary{{"a", Value::Array(16'384)}})); }, nullptr, 0},
         {[&] { lastTask()->respond(200, "{\"a\": \"\xff\"}"); }, nullptr, 0},
     };
     for (const auto& [fault, reason, code] : faults) {
