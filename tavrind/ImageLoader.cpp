@@ -173,26 +173,30 @@ void ImageLoader::_fetchImages(const std::vector<Url>& urls, const TAVBag& bag, 
 {
     const auto seconds = bag.timeoutIntervalForRequest();
     const auto timeout = seconds ? std::optional(requestTimeout(*seconds)) : std::nullopt;
-    for (const Url& url : urls) _fetchImageURL(url, timeout, source, group);
+    const auto left =
+        std::ranges::count_if(urls, [&](const Url& url) { return !_fetchImageURL(url, timeout, source, group); });
+    if (left > 0)
+        log(kLogImages).error("{} images wait already, not fetching {} further ones", ImageFetches::kWaiting, left);
 }
 
-void ImageLoader::_fetchImageURL(const Url& url, std::optional<platform::Duration> timeoutInterval,
+bool ImageLoader::_fetchImageURL(const Url& url, std::optional<platform::Duration> timeoutInterval,
                                  platform::UrlSource source, const ImageGroup& group)
 {
     _imageQueue->assertOnQueue();
-    if (!url.scheme().starts_with("http"))
-        return log(kLogImages).fault("invalid url scheme: {}", Private{url.string()});
-    if (_imageFetches.join(url, group))
-        return _startImageFetches(); // the fetch may have moved to a lane with a free slot
     const auto cache = _assembly.urlSession->cache();
-    if (cache && cache->find(url)) {
+    if (!url.scheme().starts_with("http")) {
+        log(kLogImages).fault("invalid url scheme: {}", Private{url.string()});
+    } else if (_imageFetches.join(url, group)) {
+        _startImageFetches(); // the fetch may have moved to a lane with a free slot
+    } else if (cache && cache->find(url)) {
         _assembly.requestFigures.record("cached image", {}, false);
-        return log(kLogImages).log("found {} in cache", Private{url.string()});
+        log(kLogImages).log("found {} in cache", Private{url.string()});
+    } else if (_imageFetches.add({url, timeoutInterval, source}, group)) {
+        _startImageFetches();
+    } else {
+        return false;
     }
-    if (!_imageFetches.add({url, timeoutInterval, source}, group))
-        return log(kLogImages)
-            .error("{} images wait already, not fetching {}", ImageFetches::kWaiting, Private{url.string()});
-    _startImageFetches();
+    return true;
 }
 
 void ImageLoader::_startImageFetches()

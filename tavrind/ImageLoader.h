@@ -53,7 +53,8 @@ private:
     void _addImageHosts(const std::set<std::string>& hosts);
     void _fetchImages(const std::vector<platform::Url>& urls, const TAVBag& bag, platform::UrlSource source,
                       const ImageGroup& group);
-    void _fetchImageURL(const platform::Url& url, std::optional<platform::Duration> timeoutInterval,
+    /// Returns false if too many images wait.
+    bool _fetchImageURL(const platform::Url& url, std::optional<platform::Duration> timeoutInterval,
                         platform::UrlSource source, const ImageGroup& group);
     void _startImageFetches();
     void _startImageFetch(const ImageFetch& fetch);
