@@ -20,7 +20,8 @@ TavrinUserGUIDController::TavrinUserGUIDController(Assembly& assembly)
 platform::Uuid TavrinUserGUIDController::currentUserGUID()
 {
     return _queue->sync([this] {
-        if (_assembly.device.clock.wallNow() >= _lastKnownUserGUIDExpirationDate) _rollGUID();
+        const platform::Duration left = _lastKnownUserGUIDExpirationDate - _assembly.device.clock.wallNow();
+        if (left <= platform::Duration::zero() || left > kLifetime) _rollGUID(); // longer: the clock was set back
         return _lastKnownUserGUID;
     });
 }

@@ -38,6 +38,9 @@ TEST_F(UserGUIDTest, RollsAfterFifteenMinutesOrOnResetAndTellsOnce)
     (void)controller->currentUserGUID();
     device.drain();
     EXPECT_EQ(told, 2) << "a roll begins the fifteen minutes anew";
+    const auto third = controller->currentUserGUID();
+    device.clock.setWall(device.clock.wallNow() - 24h);
+    EXPECT_NE(controller->currentUserGUID(), third) << "else it would last for a day";
 }
 
 struct Attempts {
