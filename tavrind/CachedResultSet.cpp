@@ -50,7 +50,7 @@ float uiScaleOf(const platform::UrlRequest& request)
 CachedResultSet::CachedResultSet(std::string_view input_, std::shared_ptr<const platform::UrlRequest> request_,
                                  JsonView resultSet, std::string uuid_, Date now)
     : input(platform::lowerCased(input_)), request(std::move(request_)), answer(answerWith(resultSet)),
-      uuid(std::move(uuid_)), expireTime(expireTimeOf(resultSet, now)), query(queryOf(resultSet)),
+      uuid(std::move(uuid_)), expireTime(expireTimeOf(resultSet, now)), storeTime(now), query(queryOf(resultSet)),
       inputLength(platform::utf16Length(input)), queryLength(platform::utf16Length(query)),
       completionScore(static_cast<float>(resultSet["completion_score"].value().asDouble().value_or(0))),
       uiScale(uiScaleOf(*request))
@@ -79,7 +79,8 @@ float scaleAsSent(double scale)
 
 CachedUse useOf(const CachedResultSet& set, std::size_t typedLength, float scale, Date now)
 {
-    if (set.expireTime && *set.expireTime <= now) return CachedUse::Expired;
+    const bool clockWasSetBack = now < set.storeTime;
+    if (set.expireTime && (*set.expireTime <= now || clockWasSetBack)) return CachedUse::Expired;
     if (scale > 0 && scale != set.uiScale) return CachedUse::OtherScale;
     return typedLength >= set.inputLength ? CachedUse::Candidate : CachedUse::OtherInput;
 }

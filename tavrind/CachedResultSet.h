@@ -27,6 +27,7 @@ struct CachedResultSet : std::enable_shared_from_this<CachedResultSet> {
     const platform::Bytes answer; ///< JSON of an array that holds the result set alone
     const std::string uuid;
     const std::optional<platform::Date> expireTime;
+    const platform::Date storeTime; ///< its creation
 
     // Derived from the above.
     const std::string query;       ///< "query", the completed query that the set is for, in lower case; may be empty

@@ -38,7 +38,7 @@ std::optional<std::string> shortName(const std::string& identifier)
 
 bool needsWarming(std::optional<platform::Date> lastRequest, platform::Date now)
 {
-    return !lastRequest || now - *lastRequest >= kConnectionStaysWarm;
+    return !lastRequest || now < *lastRequest || now - *lastRequest >= kConnectionStaysWarm;
 }
 
 ClientState::ClientState(std::string identifier, Assembly& assembly)

@@ -62,6 +62,7 @@ TEST(CachedResultSet, IsUsedWhereAgeScaleAndInputFit)
         {4, 2, kNow, CachedUse::OtherScale},    {4, 3.04, kNow, CachedUse::Candidate},
         {4, 3.1, kNow, CachedUse::OtherScale},  {4, 3, kNow + 59s, CachedUse::Candidate},
         {4, 3, kNow + 60s, CachedUse::Expired}, {2, 2, kNow + 60s, CachedUse::Expired},
+        {4, 3, kNow - 1s, CachedUse::Expired}, // the clock was set back
     };
     for (const auto& c : cases)
         EXPECT_EQ(useOf(*set, c.typed, scaleAsSent(c.scale), c.now), c.use) << c.typed << " " << c.scale;
