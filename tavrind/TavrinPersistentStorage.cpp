@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <charconv>
+#include <set>
 
 #include "platform/device/Device.h"
 #include "platform/files/UserDefaults.h"
@@ -182,12 +183,12 @@ std::vector<std::shared_ptr<FileContainer>> TavrinPersistentStorage::getAvailabl
 std::vector<std::shared_ptr<FileContainer>> TavrinPersistentStorage::getOpenSessionHandles()
 {
     return _queue->sync([this] {
+        std::set<fs::path> listed;
+        for (const auto& container : _fileContainers) listed.insert(container->fileUrl());
         std::vector<std::shared_ptr<FileContainer>> open;
         for (const std::string& name : _assembly.fileManager.list(_cachesUrl).value_or(std::vector<std::string>())) {
             const fs::path fileUrl = _cachesUrl / name;
-            if (sessionNumber(name) && std::ranges::find(_fileContainers, fileUrl, [](const auto& container) {
-                                           return container->fileUrl();
-                                       }) == _fileContainers.end())
+            if (sessionNumber(name) && !listed.contains(fileUrl))
                 open.push_back(std::make_shared<FileContainer>(_store, fileUrl));
         }
         return open;
