@@ -60,6 +60,7 @@ Snapshot::Directory lookAt(const std::string& name, fs::path path, bool isOurs)
 {
     Snapshot::Directory seen{.name = name, .path = path.string(), .problem = {}, .freeBytes = {}};
     struct stat status{};
+    std::error_code ignored;
     int failed = 0;
     while ((failed = lstat(path.c_str(), &status)) != 0 && errno == ENOENT && path != "/") {
         path = path.parent_path();
@@ -69,7 +70,7 @@ Snapshot::Directory lookAt(const std::string& name, fs::path path, bool isOurs)
     seen.mode = status.st_mode & 07777;
     if (failed != 0)
         seen.problem = std::strerror(errno);
-    else if (!S_ISDIR(status.st_mode) && !(S_ISLNK(status.st_mode) && fs::is_directory(path)))
+    else if (!S_ISDIR(status.st_mode) && !(S_ISLNK(status.st_mode) && fs::is_directory(path, ignored)))
         seen.problem = "not a directory";
     else if (isOurs && status.st_uid != geteuid())
         seen.problem = "belongs to another user";
@@ -176,7 +177,9 @@ Snapshot::File lookAtAuthorities(const Value& status)
 {
     const std::string* said = status["caFile"].asString();
     Snapshot::File file{said && !said->empty() ? *said : kSystemAuthorities, ""};
-    const auto bytes = platform::makeSystemFiles()->read(fs::weakly_canonical(file.path), kLargestStore);
+    std::error_code ignored;
+    const fs::path found = fs::canonical(file.path, ignored); // follows links
+    const auto bytes = platform::makeSystemFiles()->read(found.empty() ? fs::path(file.path) : found, kLargestStore);
     if (!bytes)
         file.problem = bytes.error().reason();
     else if (!bytes->view().contains("-----BEGIN"))

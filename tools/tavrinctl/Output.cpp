@@ -76,8 +76,9 @@ void startPager()
         dup2(ends[0], STDIN_FILENO);
         close(ends[0]);
         close(ends[1]);
-        setenv("LESS", "FRX", 0); // ends at once if all fits on the screen
-        execl("/bin/sh", "sh", "-c", command.c_str(), nullptr);
+        setenv("LESS", "FRX", 0);                                  // ends at once if all fits on the screen
+        const std::string orElse = "\n[ $? -ne 127 ] || exec cat"; // there is no such program
+        execl("/bin/sh", "sh", "-c", (command + orElse).c_str(), nullptr);
         _exit(127);
     }
     close(ends[0]);

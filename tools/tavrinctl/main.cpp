@@ -2,6 +2,7 @@
 
 #include <cstdio>
 #include <cstdlib>
+#include <ranges>
 
 #include <CLI/CLI.hpp>
 #include <fmt/format.h>
@@ -33,6 +34,17 @@ void printHelp(const CLI::App& app, const std::vector<std::string>& names)
         command = next;
     }
     tavrin::ctl::printText(command->help(path));
+}
+
+/// Says on standard error why the command failed; file names may hold control characters.
+void complain(std::string_view what)
+{
+    std::string text = "tavrinctl:";
+    char before = ' ';
+    for (const auto line : std::views::split(what, '\n')) {
+        text += std::exchange(before, '\n') + tavrin::ctl::printable(std::string_view(line));
+    }
+    std::fprintf(stderr, "%s\n", text.c_str());
 }
 
 } // namespace
@@ -97,7 +109,11 @@ int main(int argc, char** argv)
     } catch (const Failure& failure) {
         status = failure.status;
         endOutput();
-        if (*failure.what()) std::fprintf(stderr, "tavrinctl: %s\n", failure.what());
+        if (*failure.what()) complain(failure.what());
+    } catch (const std::exception& error) { // of the file system, for example: the working directory is gone
+        status = EXIT_FAILURE;
+        endOutput();
+        complain(error.what());
     }
     endOutput();
     return status;
