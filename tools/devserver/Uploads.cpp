@@ -51,13 +51,6 @@ std::size_t recordedEvents(const Value& session)
 }
 
 /// Returns the text with blanks instead of control characters.
-std::string oneLine(std::string text)
-{
-    for (char& c : text)
-        if (static_cast<unsigned char>(c) < 0x20 || c == 0x7f) c = ' ';
-    return text;
-}
-
 } // namespace
 
 Answer Upload::answer() const

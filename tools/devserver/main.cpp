@@ -39,8 +39,9 @@ std::string bindFailure(const std::string& address, int port, const std::string&
 void printRequest(const Request& request, const Answer& answer, std::chrono::steady_clock::time_point begin)
 {
     const std::chrono::duration<double, std::milli> taken = std::chrono::steady_clock::now() - begin;
-    fmt::print(stderr, "{} {}{}{} {} {} bytes {:.1f} ms\n", request.method, request.path,
-               request.query.empty() ? "" : "?", request.query, answer.status, answer.body.size(), taken.count());
+    fmt::print(stderr, "{} {}{}{} {} {} bytes {:.1f} ms\n", request.method, devserver::oneLine(request.path),
+               request.query.empty() ? "" : "?", devserver::oneLine(request.query), answer.status, answer.body.size(),
+               taken.count());
 }
 
 void printUpload(const std::string& line)
