@@ -130,8 +130,9 @@ int run(const Options& options)
     auto queries = valueOf(parseCorpus(bytes.view()), options.corpus);
     if (options.queries > 0 && options.queries < queries.size()) queries.resize(options.queries);
     const Report report = Replay(options).run(queries);
-    fmt::print("{}",
-               options.json ? platform::toJson(report.json(), platform::JsonStyle::Pretty) + "\n" : report.text());
+    const std::string text =
+        options.json ? platform::toJson(report.json(), platform::JsonStyle::Pretty) + "\n" : report.text();
+    if (const std::string problem = tools::writeTo(stdout, text); !problem.empty()) fail(problem);
     return report.stale().empty() && report.failed().empty() ? EXIT_SUCCESS : EXIT_FAILURE;
 }
 
