@@ -179,17 +179,6 @@ TEST_F(SourceTest, TasksRunOnTheQueueAndReportUnreadBytesAgain)
     await(4);
 }
 
-TEST_F(SourceTest, APausedSourceReportsTheEndOfItsPeerLater)
-{
-    watch(EPOLLIN, [&](std::uint32_t) { call(); });
-    queue->sync([&] { source->setEvents(0); });
-    out = FileHandle();
-    run([] {});
-    EXPECT_EQ(calls, 0);
-    queue->sync([&] { source->setEvents(EPOLLIN); });
-    await(1);
-}
-
 TEST_F(SourceTest, OnlyChangesAreReportedIfAsked)
 {
     watch(EPOLLIN | EPOLLET, [&](std::uint32_t) { call(); });
