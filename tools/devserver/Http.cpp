@@ -41,16 +41,4 @@ Answer errorAnswer(int status, std::string text)
     return jsonAnswer(platform::Value::dictionaryOf({{"error", std::move(text)}}), status);
 }
 
-std::string oneLine(std::string text)
-{
-    const auto byte = [&](std::size_t at) { return static_cast<unsigned char>(text[at]); };
-    for (std::size_t at = 0; at < text.size(); ++at) {
-        const bool beyondAscii =
-            at + 1 < text.size() && byte(at) == 0xc2 && byte(at + 1) >= 0x80 && byte(at + 1) < 0xa0;
-        if (byte(at) < 0x20 || byte(at) == 0x7f) text[at] = ' ';
-        if (beyondAscii) text[at] = text[at + 1] = ' ';
-    }
-    return text;
-}
-
 } // namespace devserver

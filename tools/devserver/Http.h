@@ -49,7 +49,4 @@ struct Answer {
 /// Returns an answer with the body {"error": text}.
 [[nodiscard]] Answer errorAnswer(int status, std::string text);
 
-/// Returns a text that others chose as one line for the terminal: blanks replace its control characters.
-[[nodiscard]] std::string oneLine(std::string text);
-
 } // namespace devserver

@@ -11,6 +11,7 @@
 #include "platform/values/Json.h"
 #include "tools/devserver/SearchFigures.h"
 #include "tools/devserver/SessionShape.h"
+#include "tools/shared/CommandLine.h"
 
 namespace devserver {
 
@@ -50,7 +51,6 @@ std::size_t recordedEvents(const Value& session)
     });
 }
 
-/// Returns the text with blanks instead of control characters.
 } // namespace
 
 Answer Upload::answer() const
@@ -143,7 +143,7 @@ std::string Uploads::add(Upload upload, const Answer& answer)
         _keptBytes -= _kept.front().size;
         _kept.pop_front();
     }
-    return oneLine(std::move(line));
+    return tavrin::tools::printable(line);
 }
 
 Value Uploads::list() const

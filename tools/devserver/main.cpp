@@ -16,6 +16,7 @@
 #include "tools/devserver/Options.h"
 #include "tools/devserver/Service.h"
 #include "tools/shared/Certificate.h"
+#include "tools/shared/CommandLine.h"
 
 namespace {
 
@@ -39,9 +40,9 @@ std::string bindFailure(const std::string& address, int port, const std::string&
 void printRequest(const Request& request, const Answer& answer, std::chrono::steady_clock::time_point begin)
 {
     const std::chrono::duration<double, std::milli> taken = std::chrono::steady_clock::now() - begin;
-    fmt::print(stderr, "{} {}{}{} {} {} bytes {:.1f} ms\n", request.method, devserver::oneLine(request.path),
-               request.query.empty() ? "" : "?", devserver::oneLine(request.query), answer.status, answer.body.size(),
-               taken.count());
+    fmt::print(stderr, "{} {}{}{} {} {} bytes {:.1f} ms\n", request.method, tavrin::tools::printable(request.path),
+               request.query.empty() ? "" : "?", tavrin::tools::printable(request.query), answer.status,
+               answer.body.size(), taken.count());
 }
 
 void printUpload(const std::string& line)

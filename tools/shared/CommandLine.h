@@ -51,4 +51,7 @@ void useReadableHelp(CLI::App& app);
 /// Writes all of `text` to a stream and flushes it. Returns an error message, or an empty text.
 [[nodiscard]] std::string writeTo(std::FILE* stream, std::string_view text);
 
+/// Replaces control characters by blanks, so that a text that others chose can't control the terminal.
+[[nodiscard]] std::string printable(std::string_view text);
+
 } // namespace tavrin::tools

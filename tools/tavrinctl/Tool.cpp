@@ -38,23 +38,4 @@ std::string readFile(const std::string& path, std::size_t maximumSize)
     return std::string(bytes->view());
 }
 
-std::string printable(std::string_view text)
-{
-    std::string clean;
-    clean.reserve(text.size());
-    for (std::size_t i = 0; i < text.size(); ++i) {
-        const auto byte = static_cast<unsigned char>(text[i]);
-        const auto next = i + 1 < text.size() ? static_cast<unsigned char>(text[i + 1]) : 0;
-        if (byte < 0x20 || byte == 0x7f) {
-            clean += ' ';
-        } else if (byte == 0xc2 && next >= 0x80 && next < 0xa0) { // the control characters beyond ASCII
-            clean += ' ';
-            ++i;
-        } else {
-            clean += text[i];
-        }
-    }
-    return clean;
-}
-
 } // namespace tavrin::ctl

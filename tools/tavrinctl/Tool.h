@@ -8,6 +8,7 @@
 #include "CoreTavrin/TAVClient.h"
 #include "CoreTavrin/TAVSessionConfiguration.h"
 #include "platform/values/Value.h"
+#include "tools/shared/CommandLine.h"
 #include "tools/tavrinctl/Output.h"
 
 namespace tavrin::ctl {
@@ -52,7 +53,6 @@ template <class T> [[nodiscard]] T valueOf(platform::Result<T> result)
 /// Reads a file of at most `maximumSize` bytes and follows links. Throws `Failure` if that fails.
 [[nodiscard]] std::string readFile(const std::string& path, std::size_t maximumSize);
 
-/// Replaces control characters by blanks, so that a text from the service cannot control the terminal.
-[[nodiscard]] std::string printable(std::string_view text);
+using tools::printable;
 
 } // namespace tavrin::ctl
