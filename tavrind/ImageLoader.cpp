@@ -173,8 +173,9 @@ void ImageLoader::_fetchImages(const std::vector<Url>& urls, const TAVBag& bag, 
 {
     const auto seconds = bag.timeoutIntervalForRequest();
     const auto timeout = seconds ? std::optional(requestTimeout(*seconds)) : std::nullopt;
-    const auto left =
-        std::ranges::count_if(urls, [&](const Url& url) { return !_fetchImageURL(url, timeout, source, group); });
+    std::size_t left = 0;
+    for (const Url& url : urls)
+        if (!_fetchImageURL(url, timeout, source, group)) ++left;
     if (left > 0)
         log(kLogImages).error("{} images wait already, not fetching {} further ones", ImageFetches::kWaiting, left);
 }
