@@ -50,7 +50,7 @@ enum class CachedUse {
 /// Returns a screen scale as a request's header has it, with one decimal: scales that the service can't tell apart are
 /// equal. 0 for none.
 [[nodiscard]] float scaleAsSent(double scale);
-/// `typedLength` is in UTF-16 units. `scale` is the client's screen scale as it is sent; 0 accepts any set.
+/// `typedLength` is in UTF-16 units. `scale` is what `scaleAsSent` returns; 0 accepts any set.
 [[nodiscard]] CachedUse useOf(const CachedResultSet& set, std::size_t typedLength, float scale, platform::Date now);
 
 /// Returns the candidate with the shortest query. Among equally short ones, prefers the highest positive score, then

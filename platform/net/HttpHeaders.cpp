@@ -54,7 +54,7 @@ void HttpHeaders::remove(std::string_view name)
 
 void HttpHeaders::replaceBy(HttpHeaders others)
 {
-    // A service may send thousands of fields.
+    // The names are in a set, because a service may send thousands of fields.
     const auto precedes = [](std::string_view a, std::string_view b) {
         return std::ranges::lexicographical_compare(a, b, {}, asciiLower, asciiLower);
     };
