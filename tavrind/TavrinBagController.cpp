@@ -432,6 +432,7 @@ void TavrinBagController::_fetchCompleted(Fetch& fetch, std::optional<platform::
     _assembly.requestFigures.record("bag", platform::Duration(static_cast<std::int64_t>(taken)), error.has_value());
     _noteAttempt(fetch.url, response ? &*response : nullptr, error ? &*error : nullptr);
     if (error) {
+        _inMemoryBagCacheAccessQueue->barrierSync([&] { _announced = {}; }); // the next announcement fetches again
         addFeedback(std::make_shared<ZRErrorFeedback>(*error));
         _assembly.notificationCenter.post({.name = TAVBagChangeNotification, .userInfo = {{"bagError", *error}}});
         _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.bag.fetchesfailed");

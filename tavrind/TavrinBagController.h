@@ -51,7 +51,7 @@ enum class BagStaleness { Fresh, Expired, NoUrl, UrlChanged };
 
 /// Limits the fetches for a version that the service announces but does not deliver: the first one is immediate, the
 /// next ones follow at intervals that double from one minute to four hours. A higher version starts again only after
-/// the last one was delivered. Not thread-safe.
+/// the last one was delivered. A failed fetch ends the limit: assign a new one. Not thread-safe.
 class AnnouncedVersion {
 public:
     /// Returns whether to fetch for `version` at `now`, in host ticks, while the bag has version `current`. If so,

@@ -260,14 +260,18 @@ TEST_F(BagControllerTest, AnAnnouncedVersionThatNeverComesIsFetchedOnce)
 {
     start();
     deliverBag();
+    const auto announce = [&] { controller().forceFetchBag(Value::dictionaryOf({{"bag", 100}})); };
     for (int answer = 0; answer < 3; ++answer) {
-        controller().forceFetchBag(Value::dictionaryOf({{"bag", 100}}));
+        announce();
         if (!lastTask()->finished) deliverBag();
     }
     EXPECT_EQ(tasks().size(), 2u);
     device.advance(1min);
-    controller().forceFetchBag(Value::dictionaryOf({{"bag", 100}}));
+    announce();
     EXPECT_EQ(tasks().size(), 3u);
+    respond("", 503);
+    announce();
+    EXPECT_EQ(tasks().size(), 4u) << "a fetch that failed is repeated at once";
 }
 
 TEST_F(BagControllerTest, AFetchThatNeverEndsIsGivenUp)
