@@ -90,6 +90,8 @@ TEST(Results, AServicesTextCantDriveTheTerminal)
 {
     EXPECT_EQ(printable("a\033[31mb\r\n\x7f"), "a [31mb   ");
     EXPECT_EQ(printable("caf\u00e9 \u009b31m \u2028"), "caf\u00e9  31m \u2028");
+    EXPECT_EQ(tools::printableJson("{\n  \"caf\u00e9\": \"\u009b\x7f\u0080\u00a0\"\n}"),
+              "{\n  \"caf\u00e9\": \"\\u009b\\u007f\\u0080\u00a0\"\n}");
     auto reply = std::make_shared<TAVReply>();
     reply->rawResponse = platform::Bytes(R"([{"results": [{"title": "We\u001b[2J", "section_name": "A"}]}])");
     EXPECT_EQ(answerLines(answered(reply)), (std::vector<ScreenLine>{{"A", ScreenLine::Style::Bold}, {"  We [2J"}}));

@@ -203,21 +203,36 @@ int endOfParsing(const CLI::App& app, const CLI::ParseError& error, const std::s
     return kWrongUsage;
 }
 
+std::size_t controlLength(std::string_view text)
+{
+    const auto byte = [&](std::size_t i) { return i < text.size() ? static_cast<unsigned char>(text[i]) : 0xff; };
+    if (byte(0) < 0x20 || byte(0) == 0x7f) return 1;
+    return byte(0) == 0xc2 && byte(1) >= 0x80 && byte(1) < 0xa0 ? 2 : 0; // those beyond ASCII, in UTF-8
+}
+
 std::string printable(std::string_view text)
 {
     std::string clean;
     clean.reserve(text.size());
-    for (std::size_t i = 0; i < text.size(); ++i) {
-        const auto byte = static_cast<unsigned char>(text[i]);
-        const auto next = i + 1 < text.size() ? static_cast<unsigned char>(text[i + 1]) : 0;
-        if (byte < 0x20 || byte == 0x7f) {
-            clean += ' ';
-        } else if (byte == 0xc2 && next >= 0x80 && next < 0xa0) { // the control characters beyond ASCII
-            clean += ' ';
-            ++i;
-        } else {
-            clean += text[i];
-        }
+    while (!text.empty()) {
+        const std::size_t control = controlLength(text);
+        clean += control > 0 ? ' ' : text.front();
+        text.remove_prefix(std::max<std::size_t>(control, 1));
+    }
+    return clean;
+}
+
+std::string printableJson(std::string_view json)
+{
+    std::string clean;
+    clean.reserve(json.size());
+    while (!json.empty()) {
+        const std::size_t control = json.front() == '\n' ? 0 : controlLength(json);
+        if (control > 0)
+            clean += fmt::format("\\u{:04x}", static_cast<unsigned char>(json[control - 1]));
+        else
+            clean += json.front();
+        json.remove_prefix(std::max<std::size_t>(control, 1));
     }
     return clean;
 }

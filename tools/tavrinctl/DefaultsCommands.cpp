@@ -71,14 +71,14 @@ void read(const Options& options, const std::string& suite, const std::string& k
         if (options.json) return printJson(settings);
         if (settings.empty()) printLine("Nothing is set. \"tavrinctl defaults list\" lists the settings.");
         for (const auto& [name, value] : settings)
-            printLine(fmt::format("{} = {}", printable(name), platform::toJson(value)));
+            printLine(fmt::format("{} = {}", printable(name), printableJson(platform::toJson(value))));
         return;
     }
     const Value* value = settings.find(key);
     if (options.json) return printJson(value ? *value : Value());
     if (!value) throw Failure(fmt::format("{} is not set", key));
     const std::string* text = value->asString();
-    printLine(text ? printable(*text) : platform::toJson(*value, platform::JsonStyle::Pretty));
+    printLine(text ? printable(*text) : printableJson(platform::toJson(*value, platform::JsonStyle::Pretty)));
 }
 
 void listDefaults(const Options& options)

@@ -50,7 +50,7 @@ std::string fieldText(const std::string& name, const Value& value)
         for (const char* key : {"id", "identifier", "reason"})
             if (value[key].asString()) return fieldText(fmt::format("{}.{}", name, key), value[key]);
         return value.count() ? fmt::format("{}{{{}}}", name, value.count()) : "";
-    default: return fmt::format("{}={}", name, platform::toJson(value));
+    default: return fmt::format("{}={}", name, printableJson(platform::toJson(value)));
     }
 }
 

@@ -128,7 +128,7 @@ void watchEvents(const Options& options, std::uint64_t count)
 
 void showBody(const Options& options, const FlushedBody& body)
 {
-    printLine(options.json ? platform::toJson(describe(body)) : summary(body));
+    printLine(options.json ? printableJson(platform::toJson(describe(body))) : summary(body));
 }
 
 void watchFlushes(const Options& options, std::uint64_t count)

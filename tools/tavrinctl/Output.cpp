@@ -134,7 +134,7 @@ void printLine(const std::string& text)
 
 void printJson(const platform::Value& value)
 {
-    printLine(platform::toJson(value, platform::JsonStyle::Pretty));
+    printLine(tools::printableJson(platform::toJson(value, platform::JsonStyle::Pretty)));
 }
 
 void endOnSignal()

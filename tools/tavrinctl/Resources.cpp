@@ -20,12 +20,9 @@ namespace {
 
 bool drivesTerminals(std::string_view text)
 {
-    return std::ranges::any_of(text,
-                               [](char c) {
-                                   const auto byte = static_cast<unsigned char>(c);
-                                   return byte == 0x7f || (byte < 0x20 && c != '\n' && c != '\r' && c != '\t');
-                               }) ||
-           text.find("\xc2\x9b") != std::string_view::npos; // CSI, the only control sequence introducer beyond ASCII
+    for (; !text.empty(); text.remove_prefix(1))
+        if (tools::controlLength(text) > 0 && !std::string_view("\n\r\t").contains(text.front())) return true;
+    return false;
 }
 
 } // namespace

@@ -54,5 +54,6 @@ template <class T> [[nodiscard]] T valueOf(platform::Result<T> result)
 [[nodiscard]] std::string readFile(const std::string& path, std::size_t maximumSize);
 
 using tools::printable;
+using tools::printableJson;
 
 } // namespace tavrin::ctl
