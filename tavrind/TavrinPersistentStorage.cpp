@@ -217,7 +217,7 @@ bool TavrinPersistentStorage::deleteSessionWithFileContainer(const std::shared_p
             log(kLogFeedbackStorage).debug("delete file url {}", fileUrl.string());
         const auto removed = fileUrl.empty() ? platform::Result<void>() : _assembly.fileManager.remove(fileUrl);
         if (!removed) log(kLogFeedbackStorage).error("File {} delete failed", fileUrl.string());
-        if (!removed && platform::mayPass(removed.error())) return false;
+        if (!removed && removed.error().code != ENOENT && removed.error().code != ENOTDIR) return false;
         _fileCounts[index(container->use())] -= static_cast<int>(std::erase(_fileContainers, container));
         return true;
     });

@@ -46,8 +46,8 @@ public:
     [[nodiscard]] std::vector<std::shared_ptr<FileContainer>> getOpenSessionHandles();
     /// Closes a file and lists it, asynchronously.
     void closeSessionWithFileContainer(std::shared_ptr<FileContainer> container);
-    /// Deletes a file and removes it from the list. Returns false, and keeps it in the list, if the deletion failed for
-    /// a reason that may pass. Blocks on the queue.
+    /// Deletes a file and removes it from the list. Returns false, and keeps it in the list, if the file stays. Blocks
+    /// on the queue.
     bool deleteSessionWithFileContainer(const std::shared_ptr<FileContainer>& container);
     /// Blocks until the files deleted so far cannot reappear after a power failure. Writes to disk; must not be called
     /// on the queue.

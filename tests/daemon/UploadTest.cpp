@@ -67,7 +67,7 @@ TEST_F(UploadTest, EndsAreCounted)
 {
     begin();
     const auto fail = [](std::int64_t code) {
-        return platform::Error::withReason(std::string(platform::kUrlErrorDomain), code, "no");
+        return platform::Error::withReason(platform::kUrlErrorDomain, code, "no");
     };
     const std::int64_t sent = counter("feedbacksent");
     const std::int64_t bookedAsSent = booked(FeedbackFate::Sent);
@@ -223,11 +223,13 @@ TEST_F(UploadTest, ASessionWhoseFileStaysWaits)
     begin();
     appear();
     flushSession();
-    device.files.fault = [](std::string_view operation, const std::filesystem::path& path) {
-        return operation == "remove" && path.filename().string().starts_with("session.") ? EROFS : 0;
-    };
-    upload();
-    EXPECT_TRUE(uploads().empty()) << "a restart would find the file, and send it again";
+    for (const int fault : {EROFS, EACCES}) {
+        device.files.fault = [fault](std::string_view operation, const std::filesystem::path& path) {
+            return operation == "remove" && path.filename().string().starts_with("session.") ? fault : 0;
+        };
+        upload();
+        EXPECT_TRUE(uploads().empty()) << "a restart would find the file, and send it again";
+    }
     device.files.fault = nullptr;
     upload();
     EXPECT_EQ(uploads().size(), 1u);
