@@ -168,6 +168,14 @@ struct Queue::Core {
             exclusive = false;
         else
             --shared;
+        resume();
+    }
+    /// Once the suspending task and all its suspensions have ended, puts their continuations first.
+    void resume() REQUIRES(mutex)
+    {
+        if (exclusive || !std::ranges::all_of(suspensions, [](const auto& each) { return each->over.load(); })) return;
+        for (const auto& ended : std::exchange(suspensions, {}) | std::views::reverse)
+            entries.push_front({.task = std::move(ended->continuation), .barrier = true});
     }
 
     Entry take() REQUIRES(mutex)
@@ -334,9 +342,7 @@ void Queue::suspendUntil(const Event& event, Duration timeout, Task continuation
         core.clock.cancel(over.timer);
         Jobs handedOver(*over.queue);
         MutexLock lock(core.mutex);
-        if (!std::ranges::all_of(core.suspensions, [](const auto& other) { return other->over.load(); })) return;
-        for (const auto& ended : std::exchange(core.suspensions, {}) | std::views::reverse)
-            core.entries.push_front({.task = std::move(ended->continuation), .barrier = true});
+        core.resume();
         core.pump(handedOver);
     };
     {

@@ -81,21 +81,25 @@ TEST_F(QueueTest, SuspensionHoldsBackWhatIsBehindIt)
 
 TEST_F(QueueTest, SuspensionsOfOneTaskEndTogetherAndInOrder)
 {
-    auto queue = serial();
-    Event first;
-    Event second;
-    queue->async([&] {
-        queue->suspendUntil(first, 2s, note(1));
-        queue->suspendUntil(second, 1s, note(2));
-    });
-    queue->async(note(3));
-    executor.drain();
-    second.signal();
-    executor.drain();
-    EXPECT_TRUE(order.empty()) << "the second may go on, but not ahead of the first";
-    first.signal();
-    executor.drain();
-    EXPECT_EQ(order, (std::vector{1, 2, 3}));
+    for (const int before : {0, 1, 2}) { // which event is signalled before the task begins
+        order.clear();
+        auto queue = serial();
+        Event first;
+        Event second;
+        if (before > 0) (before == 1 ? first : second).signal();
+        queue->async([&] {
+            queue->suspendUntil(first, 2s, note(1));
+            queue->suspendUntil(second, 1s, note(2));
+        });
+        queue->async(note(3));
+        executor.drain();
+        (before == 1 ? first : second).signal();
+        executor.drain();
+        EXPECT_TRUE(order.empty()) << "the one may go on, but not without the other";
+        (before == 1 ? second : first).signal();
+        executor.drain();
+        EXPECT_EQ(order, (std::vector{1, 2, 3})) << before;
+    }
 }
 
 TEST_F(QueueTest, SuspensionMayFollowSuspension)
