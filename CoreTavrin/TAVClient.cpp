@@ -28,7 +28,7 @@ constexpr platform::Duration kConnectTimeout = std::chrono::seconds(10);
 
 platform::Error clientError(std::int64_t code, std::string reason)
 {
-    return platform::Error::withReason(std::string(TAVClientErrorDomain), code, std::move(reason));
+    return platform::Error::withReason(TAVClientErrorDomain, code, std::move(reason));
 }
 
 /// Decodes a row's results from a message, or passes the message's error on.

@@ -21,7 +21,7 @@ enum TAVErrorCode : std::int64_t {
 /// Creates an error in `TAVErrorDomain` with this "reason".
 [[nodiscard]] inline platform::Error makeTAVError(std::int64_t code, std::string reason)
 {
-    return platform::Error::withReason(std::string(TAVErrorDomain), code, std::move(reason));
+    return platform::Error::withReason(TAVErrorDomain, code, std::move(reason));
 }
 
 } // namespace tavrin

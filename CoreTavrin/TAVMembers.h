@@ -102,8 +102,7 @@ template <class R> struct Take<std::shared_ptr<R>> {
         if (!record && record.error().code == platform::Decoder::kUnknownClass) return nullptr;
         if constexpr (requires { (*record)->problem(); })
             if (auto problem = record && *record ? (*record)->problem() : std::nullopt)
-                return std::unexpected(platform::Error::withReason(std::string(platform::kFormatErrorDomain),
-                                                                   platform::Decoder::kMalformed, std::move(*problem)));
+                return platform::malformed(std::move(*problem));
         return record;
     }
 };
@@ -116,11 +115,7 @@ template <> struct Take<std::shared_ptr<const TAVBag>> {
 template <class... T>
 platform::Result<std::tuple<T...>> takeAll(platform::ipc::Message& message, std::string_view names)
 {
-    const auto malformed = [](std::string reason) {
-        return platform::Error::withReason(std::string(platform::kFormatErrorDomain), platform::Decoder::kMalformed,
-                                           std::move(reason));
-    };
-    if (message.args.size() != sizeof...(T)) return std::unexpected(malformed("a wrong number of arguments"));
+    if (message.args.size() != sizeof...(T)) return platform::malformed("a wrong number of arguments");
     std::optional<platform::Error> failure;
     std::size_t index = 0;
     [[maybe_unused]] const auto next = [&]<class Argument>(std::type_identity<Argument>) {
@@ -128,7 +123,7 @@ platform::Result<std::tuple<T...>> takeAll(platform::ipc::Message& message, std:
         names.remove_prefix(std::min(name.size() + 1, names.size()));
         auto taken = Take<Argument>::from(message, index++);
         if (taken) return std::move(*taken);
-        if (!failure) failure = malformed(std::string(name) + ": " + taken.error().reason());
+        if (!failure) failure = platform::malformed(std::string(name) + ": " + taken.error().reason()).error();
         return Argument();
     };
     std::tuple<T...> all{next(std::type_identity<T>())...}; // braces evaluate in order

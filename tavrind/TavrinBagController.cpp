@@ -374,8 +374,7 @@ void TavrinBagController::_fetchBagStateWithVersion(const std::string& version, 
                 return;
             }
             fetch->timingData = std::move(timingData);
-            if (fetch->tookTooLong && error)
-                error = Error::withReason(std::string(platform::kUrlErrorDomain), platform::kUrlTimedOut, "timed out");
+            if (fetch->tookTooLong && error) error = platform::urlError(platform::kUrlTimedOut, "timed out");
             self->_fetchCompleted(*fetch, std::move(data), std::move(response), std::move(error));
         });
     fetch->limit =

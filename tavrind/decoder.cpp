@@ -35,11 +35,7 @@ std::optional<std::string> fromBase64(std::string_view text)
     return bytes;
 }
 
-std::unexpected<platform::Error> malformed(const char* reason)
-{
-    return std::unexpected(
-        platform::Error::withReason(std::string(platform::kFormatErrorDomain), platform::kFormatMalformed, reason));
-}
+using platform::malformed;
 
 } // namespace
 

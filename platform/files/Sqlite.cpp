@@ -38,8 +38,7 @@ void Sqlite::Finalize::operator()(sqlite3_stmt* statement) const
 
 std::unexpected<Error> Sqlite::failure() const
 {
-    return std::unexpected(Error::withReason(std::string(kSqliteErrorDomain),
-                                             sqlite3_extended_errcode(_database.get()) & 0xff,
+    return std::unexpected(Error::withReason(kSqliteErrorDomain, sqlite3_extended_errcode(_database.get()) & 0xff,
                                              sqlite3_errmsg(_database.get())));
 }
 
@@ -97,8 +96,7 @@ Result<void> Sqlite::adopt(std::span<const char* const> schema)
                     {}, [&](const Row& row) { found.emplace_back(row.text(0)); });
     if (!done || std::ranges::equal(found, schema)) return done;
     if (!found.empty())
-        return std::unexpected(
-            Error::withReason(std::string(kSqliteErrorDomain), kCorrupt, "the tables are different"));
+        return std::unexpected(Error::withReason(kSqliteErrorDomain, kCorrupt, "the tables are different"));
     return transaction([&] {
         Result<void> made;
         for (const char* statement : schema)

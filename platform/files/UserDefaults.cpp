@@ -53,8 +53,7 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
         if (!bytes) return std::unexpected(std::move(bytes.error()));
         auto value = parseJson(bytes->view(), kMaximumSuiteSize);
         if (!value) return std::unexpected(std::move(value.error()));
-        if (!value->asDictionary())
-            return std::unexpected(Error::withReason(std::string(kFormatErrorDomain), 1, "not a JSON object"));
+        if (!value->asDictionary()) return malformed("not a JSON object");
         return *value->asDictionary();
     }
 

@@ -33,11 +33,6 @@ constexpr Duration kLongestHold = std::chrono::hours(24);
 constexpr Duration kStoreRetryDelay = std::chrono::minutes(1);
 constexpr Duration kLongestResourceTimeout = std::chrono::hours(24 * 366);
 
-Error refusal(std::int64_t code, std::string reason)
-{
-    return Error::withReason(std::string(kUrlErrorDomain), code, std::move(reason));
-}
-
 std::size_t sizeOf(const UrlRequest& request)
 {
     std::size_t size = request.url.string().size() + request.method.size() + request.body.size();
@@ -395,11 +390,11 @@ Result<std::shared_ptr<BackgroundTask>> Session::_add(UrlRequest request, const 
 {
     _openStore(true);
     if (!_store) return std::unexpected(*_storeError);
-    if (request.url.empty()) return std::unexpected(refusal(kUrlBadUrl, "no URL"));
+    if (request.url.empty()) return std::unexpected(urlError(kUrlBadUrl, "no URL"));
     if (sizeOf(request) > kMaximumRequest)
-        return std::unexpected(refusal(kUrlTooLarge, fmt::format("a request of more than {} bytes", kMaximumRequest)));
+        return std::unexpected(urlError(kUrlTooLarge, fmt::format("a request of more than {} bytes", kMaximumRequest)));
     if (_entries.size() >= _configuration.maximumTasks)
-        return std::unexpected(refusal(kUrlTooLarge, fmt::format("{} tasks are waiting", _entries.size())));
+        return std::unexpected(urlError(kUrlTooLarge, fmt::format("{} tasks are waiting", _entries.size())));
     StoredTask stored{.isUpload = body != nullptr, .request = std::make_shared<const UrlRequest>(std::move(request))};
     const std::uint64_t room = _configuration.maximumBodyBytes - std::min(_configuration.maximumBodyBytes, _bodyBytes);
     if (auto added = _store->add(stored, body, room); !added) return std::unexpected(std::move(added.error()));
@@ -440,7 +435,7 @@ void Session::_cancel(const std::shared_ptr<Task>& task)
     Entry* entry = _find(task->identifier());
     if (!entry || entry->stored.outcome) return;
     entry->kept = task;
-    _finish(*entry, std::nullopt, refusal(kUrlCancelled, "cancelled"));
+    _finish(*entry, std::nullopt, urlError(kUrlCancelled, "cancelled"));
     _pump();
 }
 
@@ -530,7 +525,7 @@ void Session::_pump()
 {
     const Duration now = _time.now();
     for (const std::uint64_t task : _agenda.takeExpired(now))
-        _finish(_entries.at(task), std::nullopt, refusal(kUrlTimedOut, "not complete within the resource time-out"));
+        _finish(_entries.at(task), std::nullopt, urlError(kUrlTimedOut, "not complete within the resource time-out"));
     while (_mayTransfer()) {
         const auto task = _agenda.next(now);
         if (!task) break;

@@ -211,8 +211,7 @@ Result<void> BackgroundStore::checkDatabase()
     std::string verdict;
     auto done = _database->run("PRAGMA quick_check(1)", {}, [&](const Sqlite::Row& row) { verdict = row.text(0); });
     if (done && verdict != "ok")
-        done =
-            std::unexpected(Error::withReason(std::string(kSqliteErrorDomain), Sqlite::kCorrupt, std::move(verdict)));
+        done = std::unexpected(Error::withReason(kSqliteErrorDomain, Sqlite::kCorrupt, std::move(verdict)));
     return done ? _database->adopt(kTables) : std::move(done);
 }
 
@@ -271,8 +270,7 @@ Result<void> BackgroundStore::add(StoredTask& task, const FileHandle* body, std:
         const fs::path path = bodyPath(added.identifier);
         if (auto copied = _files.copy(path, *body, maximumBody); !copied) {
             if (copied.error().code != EFBIG) return copied;
-            return std::unexpected(Error::withReason(std::string(kUrlErrorDomain), kUrlTooLarge,
-                                                     "the bodies of all pending uploads are too large"));
+            return std::unexpected(urlError(kUrlTooLarge, "the bodies of all pending uploads are too large"));
         }
         const auto info = _files.info(path);
         if (!info) return std::unexpected(info.error());
@@ -334,8 +332,7 @@ Result<FileHandle> BackgroundStore::openBody(const StoredTask& task) const
     const auto info = fileInfo(*file);
     if (!info) return std::unexpected(info.error());
     if (info->size != task.bodySize)
-        return std::unexpected(
-            Error::withReason(std::string(kPosixErrorDomain), EBADMSG, "the body was changed on disk"));
+        return std::unexpected(Error::withReason(kPosixErrorDomain, EBADMSG, "the body was changed on disk"));
     return file;
 }
 

@@ -15,11 +15,6 @@
 
 namespace platform {
 
-Error urlError(std::int64_t code, std::string reason)
-{
-    return Error::withReason(std::string(kUrlErrorDomain), code, std::move(reason));
-}
-
 Error urlErrorFromCurl(CURLcode code, const char* detail)
 {
     const auto mapped = [code]() -> std::int64_t {

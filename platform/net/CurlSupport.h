@@ -14,8 +14,6 @@ struct UrlSessionConfiguration;
 
 // Helpers of the loader. Any thread, except for `timingDataOf`.
 
-/// Returns an error in kUrlErrorDomain.
-[[nodiscard]] Error urlError(std::int64_t code, std::string reason);
 /// Maps libcurl's result to an error in kUrlErrorDomain. `detail` is libcurl's error text; null or empty if none.
 [[nodiscard]] Error urlErrorFromCurl(CURLcode code, const char* detail);
 

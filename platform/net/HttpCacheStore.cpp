@@ -75,7 +75,7 @@ std::int64_t countOf(Date date)
 
 Error damaged(std::string reason)
 {
-    return Error::withReason(std::string(kSqliteErrorDomain), Sqlite::kCorrupt, std::move(reason));
+    return Error::withReason(kSqliteErrorDomain, Sqlite::kCorrupt, std::move(reason));
 }
 
 /// Returns the entry's number in the name of its file, or nothing for other files.

@@ -80,6 +80,10 @@ enum UrlErrorCode : std::int64_t {
     kUrlForbiddenRedirect =
         -1201, ///< to another scheme, to an address that isn't public, or with a body to another host
 };
+[[nodiscard]] inline Error urlError(std::int64_t code, std::string reason)
+{
+    return Error::withReason(kUrlErrorDomain, code, std::move(reason));
+}
 
 /// One load. It is created suspended and starts with `resume()`. Any thread.
 ///

@@ -89,8 +89,7 @@ Result<PrivacyLedger> PrivacyLedger::parse(std::string_view text)
     const std::string* secret = value ? (*value)["secret"].asString() : nullptr;
     if (text.substr(contents.size()) != "\n" + digestOf(contents) + "\n" || !secret ||
         !readHex(*secret, ledger.secret) || !readDebits((*value)["debits"], ledger.debits) || !readTime(*value, ledger))
-        return std::unexpected(
-            Error::withReason(std::string(kFormatErrorDomain), kFormatMalformed, "the privacy ledger is damaged"));
+        return malformed("the privacy ledger is damaged");
     return ledger;
 }
 

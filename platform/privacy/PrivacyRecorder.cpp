@@ -25,7 +25,7 @@ constexpr auto kKeptFor = std::chrono::days(30);
 
 std::unexpected<Error> failure(std::int64_t code, std::string reason)
 {
-    return std::unexpected(Error::withReason(std::string(kPrivacyErrorDomain), code, std::move(reason)));
+    return std::unexpected(Error::withReason(kPrivacyErrorDomain, code, std::move(reason)));
 }
 
 /// Returns the UTC day as "2026-01-31". Such texts sort by day.

@@ -9,15 +9,15 @@
 
 namespace platform {
 
-Error Error::withReason(std::string domain, std::int64_t code, std::string reason)
+Error Error::withReason(std::string_view domain, std::int64_t code, std::string reason)
 {
-    return {std::move(domain), code, Value::dictionaryOf({{"reason", std::move(reason)}})};
+    return {std::string(domain), code, Value::dictionaryOf({{"reason", std::move(reason)}})};
 }
 
 Error Error::posix(int errnum, std::string_view what)
 {
     const std::string text = std::generic_category().message(errnum);
-    return withReason(std::string(kPosixErrorDomain), errnum, what.empty() ? text : fmt::format("{}: {}", what, text));
+    return withReason(kPosixErrorDomain, errnum, what.empty() ? text : fmt::format("{}: {}", what, text));
 }
 
 std::string Error::reason() const
@@ -34,7 +34,7 @@ std::string Error::description() const
 
 std::unexpected<Error> malformed(std::string reason)
 {
-    return std::unexpected(Error::withReason(std::string(kFormatErrorDomain), kFormatMalformed, std::move(reason)));
+    return std::unexpected(Error::withReason(kFormatErrorDomain, kFormatMalformed, std::move(reason)));
 }
 
 bool mayPass(const Error& error)

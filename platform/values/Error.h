@@ -24,7 +24,7 @@ struct Error {
     {}
 
     /// Returns an error with `reason` under "reason".
-    static Error withReason(std::string domain, std::int64_t code, std::string reason);
+    static Error withReason(std::string_view domain, std::int64_t code, std::string reason);
     /// Returns the error of a system call: domain "POSIX", code `errnum`, reason "WHAT: TEXT" with the system's text.
     static Error posix(int errnum, std::string_view what = {});
 

@@ -73,7 +73,7 @@ std::optional<Error> Decoder::error() const
     if (!_failure) return std::nullopt;
     // Only a record's own class may be unknown to its reader. An unknown class inside it is a malformed field.
     const std::int64_t code = _failure->place.empty() ? _failure->code : kMalformed;
-    return Error::withReason(std::string(kFormatErrorDomain), code,
+    return Error::withReason(kFormatErrorDomain, code,
                              _failure->place.empty() ? _failure->reason
                                                      : fmt::format("{}: {}", _failure->place, _failure->reason));
 }

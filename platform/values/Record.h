@@ -447,7 +447,7 @@ template <class T> [[nodiscard]] Result<std::shared_ptr<T>> castRecord(Result<st
     if (!record) return std::unexpected(std::move(record.error()));
     if (!*record) return nullptr;
     if (auto cast = std::dynamic_pointer_cast<T>(*record)) return cast;
-    return std::unexpected(Error::withReason(std::string(kFormatErrorDomain), Decoder::kUnknownClass,
+    return std::unexpected(Error::withReason(kFormatErrorDomain, Decoder::kUnknownClass,
                                              "unexpected class " + std::string((*record)->className())));
 }
 

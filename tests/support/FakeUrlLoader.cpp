@@ -7,7 +7,7 @@ namespace platform::test {
 
 void FakeUrlLoader::Task::cancel()
 {
-    fail(Error::withReason(std::string(kUrlErrorDomain), kUrlCancelled, "cancelled"));
+    fail(Error::withReason(kUrlErrorDomain, kUrlCancelled, "cancelled"));
 }
 
 void FakeUrlLoader::Task::respond(int status, std::string body, HttpHeaders headers, std::optional<Url> from)
