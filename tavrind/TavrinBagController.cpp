@@ -42,6 +42,8 @@ constexpr double kStaleAheadSeconds = 600;
 /// Seconds by which the clock may be set back before a fresh bag counts as expired.
 constexpr double kClockTolerance = 1;
 constexpr std::size_t kMaximumBagSize = 8u << 20;
+/// Property lists have texts beyond ASCII in UTF-16.
+constexpr std::size_t kMaximumBagFile = 2 * kMaximumBagSize + (1u << 20);
 /// Limit of values in a bag: the time to write its property list grows with their square.
 constexpr std::size_t kMaximumBagValues = 1u << 14;
 constexpr std::size_t kLoggedProblems = 20;
@@ -265,9 +267,9 @@ Value TavrinBagController::diskCachedBagDictionary()
     }
     const auto path = _pathToCachedBag();
     if (!path) return {};
-    const auto bytes = _assembly.fileManager.read(*path, kMaximumBagSize);
+    const auto bytes = _assembly.fileManager.read(*path, kMaximumBagFile);
     if (!bytes && bytes.error().domain == platform::kPosixErrorDomain && bytes.error().code == ENOENT) return {};
-    auto bag = bytes ? platform::parsePropertyList(bytes->view(), kMaximumBagSize) : std::unexpected(bytes.error());
+    auto bag = bytes ? platform::parsePropertyList(bytes->view(), kMaximumBagFile) : std::unexpected(bytes.error());
     if (!bag) {
         log(kLogBag).fault("Error reading from bag cache: {}.", bag.error().description());
         return {};
@@ -304,7 +306,7 @@ Value TavrinBagController::cacheBagDictionary(const Value& fetched, const std::s
     if (!list)
         log(kLogBag).error("Error writing bag to persistent cache: {}.", list.error().description());
     else if (auto written = _assembly.fileManager.writeAtomically(*path, *list); !written)
-        log(kLogBag).error("Could not write to {}", *path + " (" + written.error().reason() + ")");
+        log(kLogBag).error("Could not write to {} ({})", *path, written.error().reason());
     return bag;
 }
 
