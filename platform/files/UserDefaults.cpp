@@ -73,13 +73,19 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
                                contents.error().description());
             contents = Dictionary();
         }
-        for (const std::string& key : dirty) {
-            if (const Value* mine = values.find(key))
-                contents->set(key, *mine);
-            else
-                contents->remove(key);
-        }
+        putInto(*contents, dirty);
         values = std::move(*contents);
+    }
+
+    /// Gives another dictionary the values of some keys.
+    void putInto(Dictionary& other, const std::set<std::string, std::less<>>& keys) const REQUIRES(mutex)
+    {
+        for (const std::string& key : keys) {
+            if (const Value* mine = values.find(key))
+                other.set(key, *mine);
+            else
+                other.remove(key);
+        }
     }
 
     /// Reads the file again after a while, and writes pending values.
@@ -143,12 +149,7 @@ struct UserDefaults::Impl : std::enable_shared_from_this<Impl> {
         {
             MutexLock lock(mutex);
             written.swap(dirty);
-            for (const std::string& key : written) {
-                if (const Value* mine = values.find(key))
-                    merged.set(key, *mine);
-                else
-                    merged.remove(key);
-            }
+            putInto(merged, written);
             values = merged;
         }
         const std::string text = toJson(merged, JsonStyle::Pretty) + "\n";
