@@ -22,10 +22,9 @@ unsigned byteAt(const std::string& text, std::size_t at)
 ContentDecoder::ContentDecoder(std::string_view codings)
 {
     while (!codings.empty() && _stages.size() < kMaximumStages) {
-        std::string_view coding = codings.substr(0, codings.find(','));
-        codings.remove_prefix(std::min(coding.size() + 1, codings.size()));
-        while (coding.starts_with(' ') || coding.starts_with('\t')) coding.remove_prefix(1);
-        while (coding.ends_with(' ') || coding.ends_with('\t')) coding.remove_suffix(1);
+        const std::string_view element = codings.substr(0, codings.find(','));
+        codings.remove_prefix(std::min(element.size() + 1, codings.size()));
+        const std::string_view coding = withoutBlanks(element);
         const bool gzip = equalIgnoringCase(coding, "gzip") || equalIgnoringCase(coding, "x-gzip");
         if (gzip || equalIgnoringCase(coding, "deflate")) _stages.emplace_front(gzip);
     }

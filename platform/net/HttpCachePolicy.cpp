@@ -14,13 +14,6 @@ using std::chrono::seconds;
 /// About 68 years; larger values count as this one (RFC 9111, 1.2.2).
 constexpr seconds kLongest{std::int64_t{1} << 31};
 
-std::string_view withoutBlanks(std::string_view text)
-{
-    const auto first = text.find_first_not_of(" \t");
-    if (first == std::string_view::npos) return {};
-    return text.substr(first, text.find_last_not_of(" \t") - first + 1);
-}
-
 /// Calls `each` with the elements of a comma-separated list. Ignores commas inside quotation marks.
 template <class Each> void forEachElement(std::string_view list, Each each)
 {

@@ -27,6 +27,13 @@ bool equalIgnoringCase(std::string_view a, std::string_view b)
     return std::ranges::equal(a, b, {}, asciiLower, asciiLower);
 }
 
+std::string_view withoutBlanks(std::string_view text)
+{
+    const auto first = text.find_first_not_of(" \t");
+    if (first == std::string_view::npos) return {};
+    return text.substr(first, text.find_last_not_of(" \t") - first + 1);
+}
+
 const std::string* HttpHeaders::find(std::string_view name) const
 {
     const auto found = std::ranges::find_if(_entries, named(name));

@@ -10,6 +10,8 @@ namespace platform {
 
 /// Compares field names, content codings or directives: ignores the case of ASCII letters (RFC 9110, 5.1). Any thread.
 [[nodiscard]] bool equalIgnoringCase(std::string_view a, std::string_view b);
+/// Returns a text without the blanks and tabs around it (RFC 9110, 5.6.3). Any thread.
+[[nodiscard]] std::string_view withoutBlanks(std::string_view text);
 
 /// Header fields in order. Names are compared case-insensitively (RFC 9110, 5.1). A plain value.
 class HttpHeaders {
