@@ -25,7 +25,9 @@ std::string subscriptionsHeader(const std::vector<Value>& subscriptions)
     constexpr std::size_t kLongest = 4096; // half of what common servers accept for all headers
     std::string header;
     for (const Value& subscription : subscriptions) {
-        const std::string entry = (header.empty() ? "[" : ",") + platform::toJson(subscription);
+        std::string entry = (header.empty() ? "[" : ",") + platform::toJson(subscription);
+        for (std::size_t at = 0; (at = entry.find('\x7f', at)) != std::string::npos;)
+            entry.replace(at, 1, "\\u007f"); // JSON has it bare in strings, a header field must not
         if (header.size() + entry.size() + 1 > kLongest)
             log(kLogSubscription)
                 .error("subscription with {} is not sent: the header has at most {} bytes",
