@@ -239,8 +239,6 @@ void BackgroundActivitiesManager::taskDidComplete(const std::shared_ptr<platform
     const UploadNote note = UploadNote::from(task->note());
     const std::string upload = note.process + '/' + std::to_string(task->identifier());
     if (_assembly.feedbackBooks.isSettled(upload)) return;
-    if (error && error->domain == platform::kUrlErrorDomain && error->code == platform::kUrlTimedOut)
-        _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.fbrequesttimedout");
 
     const bool sent = response && response->statusCode == 200;
     _findUpload(*task);
@@ -250,6 +248,8 @@ void BackgroundActivitiesManager::taskDidComplete(const std::shared_ptr<platform
     const std::int64_t count = _feedbackFlusher->getFeedbackCountForTask(*task);
     _feedbackFlusher->removeFeedbacksForTask(*task);
     _assembly.crowdsourcingFeedbackFlusher->removeFeedbacksForTask(*task);
+    if (error && error->domain == platform::kUrlErrorDomain && error->code == platform::kUrlTimedOut)
+        _assembly.diagnosticData.addValue(1, "com.quorvane.tavrind.fbrequesttimedout");
     if (sent) {
         _assembly.diagnosticData.addValue(count, "com.quorvane.tavrind.feedbacksent");
     } else {
