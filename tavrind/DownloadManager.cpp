@@ -318,9 +318,8 @@ platform::Result<fs::path> DownloadManager::_pathToResource(const std::string& i
 void DownloadManager::_deleteResource(const std::string& identifier, File file)
 {
     log(kLogDownloadManager).info("deleting resource: {}", identifier);
-    _resources.erase(identifier);
     _pending.erase(identifier);
-    _publish();
+    if (_resources.erase(identifier) > 0) _publish();
     if (file == File::Remove) _removeFile(identifier);
     _assembly.notificationCenter.post({.name = TAVFileDeletedNotification, .userInfo = {{"identifier", identifier}}});
 }
@@ -394,17 +393,13 @@ void DownloadManager::taskDidComplete(const std::shared_ptr<platform::Background
                                       const std::optional<platform::Error>& error)
 {
     if (error && error->code == platform::kUrlCancelled) return;
-    std::string reason;
     if (error)
-        reason = fmt::format("download error {} of {} {}", error->description(), task->originalRequest().url.string(),
-                             error->code);
-    else if (!response || response->url.empty())
-        return log(kLogDownloadManager).error("task completed with nil url and error: {}", "none");
-    else if (response->statusCode != 200 && response->statusCode != 304)
-        reason = fmt::format("status code {}", response->statusCode);
-    else
-        return; // handled by taskDidFinishDownloading
-    logTaskError(reason);
+        return logTaskError(fmt::format("download error {} of {} {}", error->description(),
+                                        task->originalRequest().url.string(), error->code));
+    if (!response || response->url.empty())
+        return log(kLogDownloadManager).error("task completed with nil url and error: none");
+    if (response->statusCode != 200 && response->statusCode != 304)
+        logTaskError(fmt::format("status code {}", response->statusCode));
 }
 
 } // namespace tavrin
