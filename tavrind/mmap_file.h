@@ -5,8 +5,8 @@
 
 namespace tavrin {
 
-/// The largest file that `mmapFileHandle` returns, in bytes: twice the largest resource, and many times the largest
-/// image.
+/// The largest file that `mmapFileHandle` returns, in bytes: as large as the largest resource, and many times
+/// the largest image.
 inline constexpr std::size_t kLargestMappedFile = 64u << 20;
 
 /// Returns the bytes of a whole file, which stay valid after the handle is closed. Fails with the system's error
