@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <array>
 
+#include "CoreTavrin/ClientVocabulary.h"
 #include "CoreTavrin/TAVError.h"
 #include "platform/device/Device.h"
 #include "platform/device/LocaleSource.h"
@@ -32,30 +33,16 @@ namespace {
 
 using Feedbacks = std::vector<std::shared_ptr<TavrinFeedback>>;
 
-/// Returns the first of `names` that the lower-cased text contains.
-template <std::size_t N>
-std::optional<std::string_view> firstNamed(std::string_view text, const std::array<std::string_view, N>& names)
-{
-    const std::string lower = platform::lowerCased(text);
-    const auto* found = std::ranges::find_if(names, [&](std::string_view name) { return lower.contains(name); });
-    return found == names.end() ? std::nullopt : std::optional(*found);
-}
-
 } // namespace
 
 std::optional<std::string> firstUseKey(std::string_view userAgent)
 {
     static constexpr std::array<std::string_view, 6> kClients{"wendral",  "vistrel", "lookup",
                                                               "messages", "news",    "kivo"};
-    const auto client = firstNamed(userAgent, kClients);
-    return client ? std::optional("TavrinFirstUseOfTheDay_" + std::string(*client)) : std::nullopt;
-}
-
-std::optional<std::string_view> dailyActiveClient(std::string_view firstUseKey)
-{
-    static constexpr std::array<std::string_view, 7> kClients{"wendral",  "vistrel", "kivo",   "lookup",
-                                                              "messages", "news",    "tavrind"};
-    return firstNamed(firstUseKey, kClients);
+    const std::string lower = platform::lowerCased(userAgent);
+    const auto* client = std::ranges::find_if(kClients, [&](std::string_view name) { return lower.contains(name); });
+    if (client == kClients.end()) return std::nullopt;
+    return "TavrinFirstUseOfTheDay_" + std::string(*client);
 }
 
 ClientSession::ClientSession(Assembly& assembly, std::shared_ptr<TavrinFeedback> feedback,
@@ -97,12 +84,11 @@ bool ClientSession::_firstUseOfTheDay()
     const std::string zone = _assembly.device.locale.timeZone();
     if (firstUseDate && platform::localDay(*firstUseDate, zone) == platform::localDay(*_header.baseTime, zone))
         return false;
-    return _updateFirstUseDate();
+    return _updateFirstUseDate(key);
 }
 
-bool ClientSession::_updateFirstUseDate()
+bool ClientSession::_updateFirstUseDate(const std::optional<std::string>& key)
 {
-    const auto key = firstUseKey(_header.agent);
     if (!key) {
         log(kLogSession).info("user default key not found for agent: {}", _header.agent);
         return false;
@@ -112,7 +98,7 @@ bool ClientSession::_updateFirstUseDate()
     _assembly.device.globalQueue(platform::Priority::Default)->async([&defaults = _assembly.userDefaults] {
         (void)defaults.synchronize();
     });
-    if (const auto client = dailyActiveClient(*key))
+    if (const auto client = extractClientNameFromString(*key))
         _assembly.diagnosticData.addValue(1, createCounterKey(*client, "dailyactiveusers"));
     return true;
 }

@@ -75,7 +75,7 @@ private:
     void _write(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void> call);
     // On the assembly's dateQueue.
     [[nodiscard]] bool _firstUseOfTheDay();
-    [[nodiscard]] bool _updateFirstUseDate();
+    [[nodiscard]] bool _updateFirstUseDate(const std::optional<std::string>& key);
 
     Assembly& _assembly;
     ClientSessionHeader _header;
@@ -87,7 +87,5 @@ private:
 
 /// Returns the user default with the date of a client's latest first session of a day; nothing for an untracked client.
 [[nodiscard]] std::optional<std::string> firstUseKey(std::string_view userAgent);
-/// Returns the client of such a key, under its name in the statistics; nothing if there is no such client.
-[[nodiscard]] std::optional<std::string_view> dailyActiveClient(std::string_view firstUseKey);
 
 } // namespace tavrin

@@ -261,8 +261,6 @@ TEST(FirstUse, ClientsByTheirAgent)
     EXPECT_EQ(firstUseKey("KIVO/1"), "TavrinFirstUseOfTheDay_kivo");
     EXPECT_EQ(firstUseKey("Lookup in News"), "TavrinFirstUseOfTheDay_lookup");
     EXPECT_EQ(firstUseKey(""), std::nullopt);
-    EXPECT_EQ(dailyActiveClient("TavrinFirstUseOfTheDay_messages"), "messages");
-    EXPECT_EQ(dailyActiveClient("TavrinFirstUseOfTheDay_"), std::nullopt);
 }
 
 TEST_F(SessionTest, OneOffSessions)
