@@ -18,7 +18,7 @@ constexpr int kBurst = 105;
 
 using Clients = std::vector<std::unique_ptr<TAVClient>>;
 
-/// All clients report `count` events together, in bursts. Answers how many it were.
+/// All clients report `count` events together, in bursts. Returns the number of events.
 int report(const Clients& clients, int count)
 {
     const auto events = eventsOfSearch(1);

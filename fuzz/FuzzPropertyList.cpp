@@ -10,7 +10,7 @@ using namespace platform;
 
 namespace {
 
-/// Equal; a number that is none equals itself.
+/// Compares two values; NaN equals NaN.
 bool same(const Value& a, const Value& b)
 {
     const auto isNan = [](const Value& value) {
@@ -19,7 +19,7 @@ bool same(const Value& a, const Value& b)
     return a == b || (isNan(a) && isNan(b));
 }
 
-/// Equal but for what the writer changes: unsigned numbers become reals, dates are rounded.
+/// Compares all but what the writer changes: unsigned numbers become reals, dates are rounded.
 bool sameOnceWritten(const Value& read, const Value& again)
 {
     if (const auto date = read.asDate(); date && again.asDate())

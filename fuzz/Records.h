@@ -17,7 +17,7 @@ namespace fuzz {
 using platform::operator""_field;
 
 /// Checks that a record from outside comes back whole from both of its encodings. Archives are compared, not values:
-/// they hold every field, and a number that is none equals itself there.
+/// they hold every field, and NaN equals NaN there.
 inline void checkRoundTrips(const platform::Record& record)
 {
     const auto& classes = tavrin::tavrindRecordClasses();

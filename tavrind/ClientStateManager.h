@@ -10,9 +10,6 @@
 namespace platform {
 class JsonDocument;
 class Queue;
-} // namespace platform
-
-namespace platform {
 struct UrlSource;
 } // namespace platform
 

@@ -31,7 +31,7 @@ std::string encoded(std::string_view text, std::string_view marks)
 {
     std::string result;
     for (const char c : text) {
-        if (isUnreserved(c) || marks.contains(c))
+        if (marks.contains(c))
             result += c;
         else
             result += platform::percentEncodePathSegment({&c, 1});

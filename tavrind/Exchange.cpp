@@ -253,14 +253,14 @@ void Exchange::_completed(std::optional<Bytes> data, std::optional<UrlResponse> 
     const auto document = decoded ? std::make_shared<const JsonDocument>(std::move(*decoded)) : nullptr;
     const platform::UrlSource source = platform::sourceOf(*response);
     // All work after the reply is one task, because a second task would wake another thread.
-    auto behind = [self = shared_from_this(), document, source, responseSize, statusCode, timingData](bool cached) {
+    auto afterReply = [self = shared_from_this(), document, source, responseSize, statusCode, timingData](bool cached) {
         self->endNetworkFeedback(document.get(), responseSize, statusCode, timingData);
         return self->_useAnswer(document, source, cached);
     };
     // The store is queued before the reply, so that a client that has received an answer finds it in the cache. The
     // reply needs only the text, so the sets are created on the cache's queue.
     const bool cached = document && _mayCache(*document);
-    if (cached) _client->queryCache()->setMade([behind] { return behind(true); }, _cacheGeneration);
+    if (cached) _client->queryCache()->setMade([afterReply] { return afterReply(true); }, _cacheGeneration);
 
     auto reply = std::make_shared<TAVReply>();
     reply->scale = _request->scale;
@@ -275,8 +275,8 @@ void Exchange::_completed(std::optional<Bytes> data, std::optional<UrlResponse> 
     if (!document)
         endNetworkFeedback(nullptr, responseSize, statusCode, timingData);
     else if (!cached)
-        _assembly.device.globalQueue(platform::Priority::Default)->async([behind = std::move(behind)] {
-            (void)behind(false);
+        _assembly.device.globalQueue(platform::Priority::Default)->async([afterReply = std::move(afterReply)] {
+            (void)afterReply(false);
         });
     _forceFetch(*response);
 }

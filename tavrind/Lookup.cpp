@@ -225,7 +225,7 @@ void Lookup::_reprocessHintsFile(SourceKind kind, const Dictionary& versions)
     const auto resource = _assembly.downloadManager->fileHandleForResource(identifier);
     if (!resource)
         return log(kLogLookUp)
-            .info("reprocess file doesn't exist or there was an error. file: {} error: {}", "none",
+            .info("reprocess file doesn't exist or there was an error. file: none error: {}",
                   resource.error().description());
     _pushDDSourceFile(&resource->file, kind, version);
 }

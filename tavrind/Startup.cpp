@@ -78,8 +78,8 @@ platform::Result<std::unique_ptr<Daemon>> startUp(platform::Device& device, Star
     TAVTracingSetup(device.userDefaults);
     if (device.userDefaults.boolean("TAVLogPrivateData")) platform::Log::privateData = true;
     device.userDefaults.registerDefaults({{"TAVSharedSession", true},
-                                          {"TAVSessionSizeLimit", 4u << 20},    // bytes
-                                          {"TAVSessionMaxAge", 48 * 60 * 60}}); // seconds
+                                          {"TAVSessionSizeLimit", kDefaultMaxFileSize},
+                                          {"TAVSessionMaxAge", kDefaultMaxFileAge}});
 
     auto daemon = std::make_unique<Daemon>(device);
     Assembly& assembly = daemon->assembly;

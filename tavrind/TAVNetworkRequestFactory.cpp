@@ -486,8 +486,7 @@ bool TAVNetworkRequestFactory::_updateProfile(const platform::DeviceProfile& pro
     _context.geoSessionEntity = profile.geoSessionEntity.value_or("");
     if (_context.geoSessionId.empty() && !_context.geoSessionEntity.empty())
         log(kLogRequest)
-            .error("GEOUserSessionEntity does not respond to selector sessionIDString, actual class is {}",
-                   "geoSession");
+            .error("GEOUserSessionEntity does not respond to selector sessionIDString, actual class is geoSession");
     const bool changed = _context.geoDeviceCountryCode != before;
     if (changed) ++_bagContextGeneration;
     return changed;

@@ -70,8 +70,7 @@ makeTemporaryFile(platform::FileSystem& files, const std::filesystem::path& dire
 
 std::string_view convertIdentifierToString(FlusherIdentity identifier)
 {
-    const auto index = static_cast<std::uint64_t>(identifier);
-    return index < kTexts<FlusherIdentity>.size() ? kTexts<FlusherIdentity>[index] : "";
+    return enumToString(identifier).value_or("");
 }
 
 Value UploadNote::value() const
@@ -265,10 +264,8 @@ Value TavrinFeedbackFlusher::preview(Flushable& object)
     if (const auto endpoint = serverEndpoint()) {
         const platform::UrlRequest request =
             _assembly.requestFactory->flusherUploadRequest(*endpoint, kUploadTimeout, stream.dataDigestForStream());
-        platform::Dictionary headers;
-        for (const auto& [name, value] : request.headers) headers.set(name, value);
         preview.set("url", request.url.string());
-        preview.set("headers", std::move(headers));
+        preview.set("headers", headerDictionary(request.headers));
     }
     return preview;
 }

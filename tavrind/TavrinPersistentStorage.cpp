@@ -23,8 +23,6 @@ namespace fs = std::filesystem;
 namespace {
 
 constexpr std::string_view kFilePrefix = "session.";
-constexpr double kDefaultMaxFileSize = 4u << 20;    // bytes
-constexpr double kDefaultMaxFileAge = 48 * 60 * 60; // seconds
 constexpr double kLargestLimit = 1e15;
 /// Limits of open and listed files, by `FileUse`; each open file takes a descriptor. One-off sessions have a separate
 /// limit, so that they never prevent the creation of a real session's file.
@@ -43,8 +41,8 @@ double limit(const platform::UserDefaults& userDefaults, std::string_view key, d
     return value >= 1 ? std::min(value, kLargestLimit) : fallback;
 }
 
-} // namespace
-
+/// Returns the number in the name of a session file ("session.17"); nothing for another name, or for a number above
+/// INT32_MAX / 2, which would leave too few numbers for later files.
 std::optional<std::int32_t> sessionNumber(std::string_view fileName)
 {
     if (!fileName.starts_with(kFilePrefix)) return std::nullopt;
@@ -56,6 +54,8 @@ std::optional<std::int32_t> sessionNumber(std::string_view fileName)
     if (error != std::errc() || number > INT32_MAX / 2) return std::nullopt;
     return number;
 }
+
+} // namespace
 
 TavrinPersistentStorage::TavrinPersistentStorage(Assembly& assembly)
     : _assembly(assembly), _queue(assembly.device.serialQueue("com.quorvane.tavrind.persistentStorageQueue",

@@ -22,9 +22,9 @@ struct FileContainerStore;
 class FileContainer;
 enum class FileUse;
 
-/// Returns the number in the name of a session file ("session.17"); nothing for another name, or for a number above
-/// INT32_MAX / 2, which would leave too few numbers for later files.
-[[nodiscard]] std::optional<std::int32_t> sessionNumber(std::string_view fileName);
+/// The user defaults "TAVSessionSizeLimit", in bytes, and "TAVSessionMaxAge", in seconds, if they are not set.
+inline constexpr std::int64_t kDefaultMaxFileSize = 4 << 20;
+inline constexpr std::int64_t kDefaultMaxFileAge = 48 * 60 * 60;
 
 /// The directory of session files.
 ///

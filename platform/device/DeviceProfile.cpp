@@ -1,7 +1,6 @@
 #include "platform/device/DeviceProfile.h"
 
 #include <cerrno>
-#include <mutex>
 #include <utility>
 #include <vector>
 
@@ -99,8 +98,10 @@ private:
             return {};
         }
         const auto value = parseJson(bytes->view(), kMaximumProfileSize);
-        if (!value) defaultLog().error("device.json is broken: {}", value.error().description());
-        if (!value) return {};
+        if (!value) {
+            defaultLog().error("device.json is broken: {}", value.error().description());
+            return {};
+        }
         std::vector<std::string> problems;
         DeviceProfile profile = deviceProfileFromValue(*value, problems);
         for (const std::string& problem : problems) defaultLog().error("device.json: {}", problem);

@@ -4,7 +4,6 @@
 #include <cerrno>
 #include <cstdlib>
 #include <map>
-#include <mutex>
 #include <set>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -18,6 +17,7 @@
 #include "platform/files/FileWatch.h"
 #include "platform/run/Clock.h"
 #include "platform/run/RunLoop.h"
+#include "platform/text/Text.h"
 
 namespace platform {
 
@@ -35,12 +35,6 @@ constexpr std::size_t kMaximumDesktopEntry = 1u << 20;
 constexpr std::size_t kMaximumMetadataSize = 4u << 20;
 constexpr Duration kSettleTime = std::chrono::seconds(2);
 constexpr std::string_view kSuffix = ".desktop";
-
-std::string_view trimmed(std::string_view text)
-{
-    const std::size_t begin = std::min(text.find_first_not_of(" \t\r"), text.size());
-    return text.substr(begin, text.find_last_not_of(" \t\r") + 1 - begin);
-}
 
 /// Returns the keys of an entry's main group; values are not unescaped.
 std::map<std::string, std::string, std::less<>> mainGroup(std::string_view entry)

@@ -109,7 +109,7 @@ std::optional<std::string> zoneOfPath(std::string_view path)
 
 constexpr const char* kLocaleFiles[] = {"locale.conf", "default/locale"};
 constexpr const char* kLocalTime = "localtime";
-constexpr const char* kTimeZone = "timezone"; // the name, where the above is a copy
+constexpr const char* kTimeZone = "timezone"; // has the zone's name if the above is a copy, not a link
 constexpr const char* kKeyboardFile = "default/keyboard";
 
 class SystemLocale final : public LocaleSource {

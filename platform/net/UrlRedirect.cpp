@@ -94,13 +94,14 @@ bool goesToAnyOrigin(std::string_view name)
     return std::ranges::any_of(kNames, [name](std::string_view other) { return equalIgnoringCase(name, other); });
 }
 
-} // namespace
-
+/// Returns the URL's origin, scheme, host and port: "https://example.com:443" (RFC 9110, 4.3.1).
 std::string originOf(const Url& url)
 {
     const std::string scheme = url.scheme();
     return fmt::format("{}://{}:{}", scheme, url.host(), url.port().value_or(scheme == "https" ? 443 : 80));
 }
+
+} // namespace
 
 bool isPublicAddress(const std::string& address)
 {

@@ -9,9 +9,6 @@ namespace platform {
 
 // The rules for following redirects and URLs that a response names. Pure functions; any thread.
 
-/// Returns the URL's origin, scheme, host and port: "https://example.com:443" (RFC 9110, 4.3.1).
-[[nodiscard]] std::string originOf(const Url& url);
-
 /// Returns true if an IP address in text form is globally reachable by IANA's registries of special-purpose addresses.
 /// Returns false for addresses of this device or an internal network (loopback, private, link-local, carrier-grade
 /// NAT), for those of no host (documentation, benchmarking, multicast, reserved), and for text that is not an address.

@@ -110,7 +110,7 @@ TEST_F(BagControllerTest, FetchesOnceKeepsItOnDiskAndRestartsFromThere)
     EXPECT_TRUE(another->fetchInProgress() && another->inMemoryBag()) << "a stale bag is fetched anew as it is read";
 }
 
-// The service's faults: each leaves the bag at hand, is announced, and doesn't stop the next fetch.
+// The service's faults: each leaves the current bag, is announced, and doesn't stop the next fetch.
 TEST_F(BagControllerTest, FailedFetchesLeaveTheOldBag)
 {
     start();

@@ -46,7 +46,7 @@ private:
     std::vector<std::string> _names;
 };
 
-/// Reads one field from nowhere: each read answers a value that differs from zero and from those before. A field that
+/// Reads one field from nowhere: each read returns a value that differs from zero and from those before. A field that
 /// holds records gets new ones of class `nested`.
 class Filler final : public platform::Decoder {
 public:
@@ -122,7 +122,7 @@ private:
     Value _given;
 };
 
-/// Sets every field of a record, and answers what each was given. Fields that hold records get the first class that
+/// Sets every field of a record, and returns what each was given. Fields that hold records get the first class that
 /// they take; a field that takes nothing is missing in the answer.
 inline std::map<std::string, Value> fill(platform::Record& record, const platform::RecordClasses& classes)
 {

@@ -10,7 +10,7 @@
 namespace platform::test {
 
 /// The bytes of the first block "hexdump" in a page of docs/: lines of an offset, bytes in hexadecimal, and what they
-/// mean behind a bar. Empty where there is none.
+/// mean behind a bar. Empty if the page has none.
 inline std::string hexDumpIn(const std::string& page)
 {
     std::ifstream file(std::string(SOURCE_DIR "/docs/") + page);

@@ -10,6 +10,9 @@ namespace devserver {
 
 using platform::Value;
 
+namespace {
+
+/// Returns the first 100 headers as a JSON object. Hides the values of headers with credentials.
 Value describeHeaders(const Headers& headers)
 {
     constexpr std::size_t kMostHeaders = 100;
@@ -23,6 +26,8 @@ Value describeHeaders(const Headers& headers)
     }
     return described;
 }
+
+} // namespace
 
 std::uint64_t RequestLog::add(std::string_view endpoint, const Request& request)
 {

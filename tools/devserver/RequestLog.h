@@ -4,7 +4,6 @@
 #include <cstdint>
 #include <deque>
 #include <map>
-#include <mutex>
 #include <string>
 #include <string_view>
 
@@ -51,8 +50,5 @@ private:
     std::map<std::string, std::uint64_t, std::less<>> _counts GUARDED_BY(_mutex);
     std::deque<Kept> _kept GUARDED_BY(_mutex);
 };
-
-/// Returns the first 100 headers as a JSON object. Hides the values of headers with credentials.
-[[nodiscard]] platform::Value describeHeaders(const Headers& headers);
 
 } // namespace devserver

@@ -343,18 +343,13 @@ int statusOf(const std::vector<Finding>& findings)
     return status;
 }
 
-std::string_view severityName(Severity severity)
-{
-    constexpr std::string_view kNames[]{"fine", "warning", "error"};
-    return kNames[static_cast<std::size_t>(severity)];
-}
-
 Value describe(const std::vector<Finding>& findings)
 {
+    constexpr std::string_view kSeverities[]{"fine", "warning", "error"};
     Value::Array list;
     for (const Finding& finding : findings)
         list.push_back(Value::dictionaryOf({{"topic", finding.topic},
-                                            {"severity", severityName(finding.severity)},
+                                            {"severity", kSeverities[static_cast<std::size_t>(finding.severity)]},
                                             {"text", finding.text},
                                             {"advice", finding.advice}}));
     return Value::dictionaryOf({{"status", statusOf(findings)}, {"findings", std::move(list)}});

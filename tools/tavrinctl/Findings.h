@@ -68,7 +68,6 @@ struct Finding {
 /// Returns the exit status: 0, 1 for warnings, 2 for errors.
 [[nodiscard]] int statusOf(const std::vector<Finding>& findings);
 [[nodiscard]] platform::Value describe(const std::vector<Finding>& findings);
-[[nodiscard]] std::string_view severityName(Severity severity);
 
 /// Parses the Date header of a response: seconds since 1970.
 [[nodiscard]] std::optional<double> httpDate(const std::string& text);

@@ -80,8 +80,6 @@ void printHttp(const TAVReply& reply)
     }
 }
 
-} // namespace
-
 std::string_view outcomeName(Outcome outcome)
 {
     switch (outcome) {
@@ -93,18 +91,27 @@ std::string_view outcomeName(Outcome outcome)
     return "failed";
 }
 
-Outcome Exchange::outcome() const
-{
-    if (!answer || answer->error) return Outcome::Failed;
-    if (const int status = serviceStatus(*this); status != 0 && (status < 200 || status > 299)) return Outcome::Failed;
-    if (answer->reply) return Outcome::Answered;
-    return overtaken && skipReason.empty() ? Outcome::Overtaken : Outcome::Skipped;
-}
-
+/// Returns the HTTP status of an answer that came from the service; 0 if it did not, or if the reply is not verbose.
 int serviceStatus(const Exchange& exchange)
 {
     const auto* reply = exchange.answer ? exchange.answer->reply.get() : nullptr;
     return reply && reply->httpResponse ? static_cast<int>(reply->httpResponse->statusCode) : 0;
+}
+
+bool serviceFailed(const Exchange& exchange)
+{
+    const int status = serviceStatus(exchange);
+    return status != 0 && (status < 200 || status > 299);
+}
+
+} // namespace
+
+Outcome Exchange::outcome() const
+{
+    if (!answer || answer->error) return Outcome::Failed;
+    if (serviceFailed(*this)) return Outcome::Failed;
+    if (answer->reply) return Outcome::Answered;
+    return overtaken && skipReason.empty() ? Outcome::Overtaken : Outcome::Skipped;
 }
 
 bool lacksBag(const Exchange& exchange)
@@ -133,8 +140,7 @@ std::string explanation(const Exchange& exchange)
     case Outcome::Failed: break;
     }
     if (!exchange.answer) return exchange.problem;
-    if (const int status = serviceStatus(exchange); status != 0 && (status < 200 || status > 299))
-        return fmt::format("the service answered {}", status);
+    if (serviceFailed(exchange)) return fmt::format("the service answered {}", serviceStatus(exchange));
     return explain(exchange);
 }
 

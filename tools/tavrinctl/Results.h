@@ -15,7 +15,6 @@ enum class Outcome {
     Overtaken, ///< delivered empty, because a later request was accepted before the answer came
     Failed,
 };
-[[nodiscard]] std::string_view outcomeName(Outcome outcome);
 
 /// One request and its answer.
 struct Exchange {
@@ -34,8 +33,6 @@ struct Exchange {
     [[nodiscard]] bool waiting() const { return !answer && problem.empty(); }
 };
 
-/// Returns the HTTP status of an answer that came from the service; 0 if it did not, or if the reply is not verbose.
-[[nodiscard]] int serviceStatus(const Exchange& exchange);
 /// Returns whether the request failed because the daemon had no bag in time.
 [[nodiscard]] bool lacksBag(const Exchange& exchange);
 
