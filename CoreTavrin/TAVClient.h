@@ -7,7 +7,6 @@
 #include <memory>
 #include <optional>
 #include <string>
-#include <vector>
 
 #include "platform/ipc/BusClient.h"
 #include "platform/ipc/Ipc.h"

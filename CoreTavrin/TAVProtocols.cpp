@@ -2,7 +2,6 @@
 
 #include <algorithm>
 #include <functional>
-#include <span>
 
 #include "CoreTavrin/TAVMembers.h"
 #include "CoreTavrin/TAVReply.h"

@@ -4,7 +4,6 @@
 #include <memory>
 #include <optional>
 #include <string>
-#include <vector>
 
 #include "platform/ipc/Ipc.h"
 #include "platform/run/Reply.h"

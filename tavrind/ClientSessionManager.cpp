@@ -2,7 +2,6 @@
 
 #include <algorithm>
 #include <initializer_list>
-#include <iterator>
 #include <optional>
 
 #include "CoreTavrin/TAVBag.h"

@@ -5,7 +5,6 @@
 #include <deque>
 #include <filesystem>
 #include <memory>
-#include <mutex>
 #include <string>
 
 #include "platform/base/Mutex.h"

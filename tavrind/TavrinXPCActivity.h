@@ -1,7 +1,5 @@
 #pragma once
 
-#include <functional>
-#include <memory>
 #include <string>
 
 #include "platform/device/ActivityScheduler.h"

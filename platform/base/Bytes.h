@@ -9,7 +9,7 @@ namespace platform {
 
 /// An immutable run of bytes: a response body, a mapped file, an upload.
 ///
-/// Copies and slices share the bytes and their owner (a string, a mapping); the last of them releases it. Any thread.
+/// Copies share the bytes and their owner (a string, a mapping); the last of them releases it. Any thread.
 class Bytes {
 public:
     Bytes() = default;
@@ -29,12 +29,6 @@ public:
     [[nodiscard]] const char* data() const { return _view.data(); }
     [[nodiscard]] std::size_t size() const { return _view.size(); }
     [[nodiscard]] bool empty() const { return _view.empty(); }
-
-    /// Returns at most `count` bytes from `offset` on. Throws std::out_of_range if `offset` is past the end.
-    [[nodiscard]] Bytes slice(std::size_t offset, std::size_t count = std::string_view::npos) const
-    {
-        return {_owner, _view.substr(offset, count)};
-    }
 
     friend bool operator==(const Bytes& a, const Bytes& b) { return a._view == b._view; }
 

@@ -3,7 +3,6 @@
 #include <atomic>
 #include <cstddef>
 #include <functional>
-#include <memory>
 #include <string>
 #include <string_view>
 #include <type_traits>
@@ -56,7 +55,6 @@ public:
 
     [[nodiscard]] static bool enabled(LogLevel level) { return level >= threshold.load(std::memory_order_relaxed); }
     [[nodiscard]] const std::string& category() const { return _category; }
-    [[nodiscard]] const std::string& subsystem() const { return _subsystem; }
 
     /// The lowest level that is written; Default at start.
     static std::atomic<LogLevel> threshold;

@@ -13,7 +13,6 @@
 #endif
 #define GUARDED_BY(mutex) THREAD_SAFETY(guarded_by(mutex))
 #define REQUIRES(...) THREAD_SAFETY(requires_capability(__VA_ARGS__))
-#define EXCLUDES(...) THREAD_SAFETY(locks_excluded(__VA_ARGS__))
 
 namespace platform {
 

@@ -26,7 +26,6 @@ public:
     [[nodiscard]] std::string string() const;
 
     [[nodiscard]] bool isNil() const { return _bytes == std::array<std::uint8_t, 16>{}; }
-    [[nodiscard]] const std::array<std::uint8_t, 16>& bytes() const { return _bytes; }
 
     auto operator<=>(const Uuid&) const = default;
 

@@ -2,7 +2,6 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <mutex>
 #include <optional>
 
 #include "platform/base/Log.h"

@@ -3,7 +3,6 @@
 #include <algorithm>
 #include <cerrno>
 #include <charconv>
-#include <mutex>
 #include <set>
 
 #include "platform/base/Log.h"

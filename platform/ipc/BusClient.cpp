@@ -60,9 +60,6 @@ CallResult decodeAs(sd_bus_message* message, std::string_view signature, const R
 } // namespace
 
 struct Client::Impl {
-    struct BusUnref {
-        void operator()(sd_bus* bus) const { sd_bus_close_unref(bus); }
-    };
     /// A call that was sent; owned by its bus slot.
     struct PendingCall {
         PendingCall(const Member& member, Answer answer_)
@@ -139,8 +136,7 @@ Result<std::unique_ptr<Client>> Client::connect(const std::string& address, std:
     return std::unexpected(Error::posix(client->connected() ? ETIMEDOUT : ECONNREFUSED, address));
 }
 
-void Client::call(std::string_view interface, const Member& member, Message arguments, Answer answer,
-                  std::optional<Duration> timeout)
+void Client::call(std::string_view interface, const Member& member, Message arguments, Answer answer)
 {
     const std::string interfaceName(member.interface.empty() ? interface : member.interface);
     const std::string name(member.name);
@@ -167,8 +163,7 @@ void Client::call(std::string_view interface, const Member& member, Message argu
     }
     auto pending = std::make_unique<Impl::PendingCall>(member, std::move(answer));
     sd_bus_slot* slot = nullptr;
-    const std::uint64_t wait = timeout ? std::max<std::uint64_t>(microseconds(*timeout), 1) : UINT64_MAX;
-    result = sd_bus_call_async(_impl->bus.get(), &slot, raw, &Impl::onReply, pending.get(), wait);
+    result = sd_bus_call_async(_impl->bus.get(), &slot, raw, &Impl::onReply, pending.get(), UINT64_MAX);
     if (result < 0) {
         answer = std::move(pending->answer);
         return fail(std::strerror(-result));

@@ -20,11 +20,10 @@ public:
     ~Client();
 
     using Answer = std::function<void(CallResult)>;
-    /// Sends a call. A later `wait` passes the reply to `answer`, or an error: the service's, one if the call couldn't
-    /// be sent, or one after `timeout`. Without `answer` no reply is requested. If the connection ends, pending answers
+    /// Sends a call. A later `wait` passes the reply to `answer`, or an error: the service's, or one if the call
+    /// couldn't be sent. Without `answer` no reply is requested. If the connection ends, pending answers
     /// are dropped.
-    void call(std::string_view interface, const Member& member, Message arguments, Answer answer,
-              std::optional<Duration> timeout = std::nullopt);
+    void call(std::string_view interface, const Member& member, Message arguments, Answer answer);
     /// Sets the handler of signals (interface, member, arguments), which runs inside `wait`.
     void onSignal(std::function<void(std::string_view, std::string_view, Message)> handler);
     /// Reads and dispatches until `done()` returns true; returns false if the connection ends or `timeout` passes

@@ -88,11 +88,6 @@ private:
     const std::shared_ptr<BusConnection> _core;
 };
 
-void BusConnection::BusUnref::operator()(sd_bus* bus) const
-{
-    sd_bus_close_unref(bus);
-}
-
 std::shared_ptr<BusConnection> BusConnection::make(std::shared_ptr<BusContext> context,
                                                    std::shared_ptr<const Interface> interface, FileHandle socket,
                                                    Peer peer, const std::string& label, std::function<void()> closed)

@@ -51,9 +51,6 @@ public:
 
 private:
     class Handle;
-    struct BusUnref {
-        void operator()(sd_bus* bus) const;
-    };
     enum class State { Waiting, Open, Draining, Closed };
     /// A call without a reply yet.
     struct PendingCall {

@@ -51,6 +51,11 @@ void BusMessageUnref::operator()(sd_bus_message* message) const
     sd_bus_message_unref(message);
 }
 
+void BusUnref::operator()(sd_bus* bus) const
+{
+    sd_bus_close_unref(bus);
+}
+
 std::expected<DecodedArguments, CallError> decodeArguments(sd_bus_message* message, std::size_t maximumSize,
                                                            const RecordArguments& records)
 {

@@ -7,6 +7,7 @@
 
 #include "platform/ipc/Ipc.h"
 
+struct sd_bus;
 struct sd_bus_message;
 
 /// Encodes and decodes the arguments of bus messages. Call these only on the thread that uses the message's bus.
@@ -17,6 +18,10 @@ struct BusMessageUnref {
 };
 /// A counted reference to a bus message.
 using BusMessage = std::unique_ptr<sd_bus_message, BusMessageUnref>;
+/// Closes and releases the bus.
+struct BusUnref {
+    void operator()(sd_bus* bus) const;
+};
 
 struct DecodedArguments {
     Message message;

@@ -1,7 +1,5 @@
 #include "platform/ipc/BusStandardCalls.h"
 
-#include <cstring>
-
 #include <fmt/format.h>
 #include <systemd/sd-bus.h>
 #include <systemd/sd-id128.h>

@@ -1,6 +1,5 @@
 #include "platform/net/UrlSessionCaching.h"
 
-#include <mutex>
 #include <utility>
 
 #include "platform/base/Mutex.h"

@@ -1,6 +1,5 @@
 #include "platform/run/RunLoop.h"
 
-#include <atomic>
 #include <csignal>
 #include <cstdlib>
 #include <pthread.h>

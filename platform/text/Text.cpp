@@ -103,7 +103,6 @@ WordFinder::WordFinder(const std::string& locale) : _impl(std::make_unique<Impl>
 }
 
 WordFinder::~WordFinder() = default;
-WordFinder::WordFinder(WordFinder&&) noexcept = default;
 
 std::vector<std::string> WordFinder::wordsIn(std::string_view text)
 {
@@ -146,7 +145,6 @@ LocalizedSearch::LocalizedSearch(std::string_view text, const std::string& local
 }
 
 LocalizedSearch::~LocalizedSearch() = default;
-LocalizedSearch::LocalizedSearch(LocalizedSearch&&) noexcept = default;
 
 bool LocalizedSearch::contains(std::string_view part) const
 {

@@ -28,7 +28,6 @@ public:
     /// `locale` is a name like "de_CH"; an invalid name selects the root locale.
     explicit WordFinder(const std::string& locale);
     ~WordFinder();
-    WordFinder(WordFinder&&) noexcept;
     /// Returns the words in order: runs of letters, digits or ideographs, without separators. Reads at most 1 MiB of
     /// the text. Returns nothing if ICU has no rules for the locale.
     [[nodiscard]] std::vector<std::string> wordsIn(std::string_view text);
@@ -47,7 +46,6 @@ public:
     /// Keeps at most 1 MiB of the text. An invalid `locale` selects the root locale.
     LocalizedSearch(std::string_view text, const std::string& locale);
     ~LocalizedSearch();
-    LocalizedSearch(LocalizedSearch&&) noexcept;
     /// Returns true if the text contains `part`; false if `part` compares equal to the empty text.
     [[nodiscard]] bool contains(std::string_view part) const;
 

@@ -7,7 +7,6 @@
 #include <cstring>
 #include <string>
 #include <string_view>
-#include <type_traits>
 
 #include "platform/values/Value.h"
 

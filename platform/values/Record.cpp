@@ -127,14 +127,6 @@ std::shared_ptr<Record> decodeRecordIf(Decoder& decoder, bool (*wanted)(const Re
     return decoder.failed() ? nullptr : record;
 }
 
-void decodeRecordInto(Decoder& decoder, Record& record)
-{
-    const std::string_view className = decoder.beginRecord();
-    if (decoder.failed()) return;
-    if (className != record.className()) return decoder.fail(fmt::format("unexpected class {}", className));
-    decodeFields(decoder, record);
-}
-
 std::optional<Error> errorFromDictionary(const Value& value)
 {
     const Value& domain = value["domain"];

@@ -1,6 +1,5 @@
 #pragma once
 
-#include <concepts>
 #include <cstdint>
 #include <limits>
 #include <memory>
@@ -233,8 +232,6 @@ template <class T> [[nodiscard]] std::shared_ptr<T> decodeRecordIfA(Decoder& dec
     const auto isA = [](const Record& record) { return dynamic_cast<const T*>(&record) != nullptr; };
     return std::dynamic_pointer_cast<T>(decodeRecordIf(decoder, isA));
 }
-/// Reads the next record into `record`; fails if it is of another class.
-void decodeRecordInto(Decoder& decoder, Record& record);
 
 /// Returns the error that a field of type Error is encoded as; nothing if an entry is of the wrong type. Missing
 /// entries read as empty.

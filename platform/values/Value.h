@@ -1,7 +1,6 @@
 #pragma once
 
 #include <cstdint>
-#include <expected>
 #include <initializer_list>
 #include <memory>
 #include <optional>

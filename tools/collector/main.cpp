@@ -3,7 +3,6 @@
 
 #include <csignal>
 #include <cstdio>
-#include <exception>
 #include <string>
 
 #include <CLI/CLI.hpp>

@@ -3,7 +3,6 @@
 #include <cstdint>
 #include <expected>
 #include <map>
-#include <mutex>
 #include <string>
 
 #include "platform/base/Mutex.h"

@@ -1,7 +1,6 @@
 #include "tools/devserver/Catalogue.h"
 
 #include <algorithm>
-#include <array>
 #include <charconv>
 #include <stdexcept>
 

@@ -1,6 +1,5 @@
 #include "tools/devserver/Compression.h"
 
-#include <algorithm>
 #include <array>
 #include <stdexcept>
 

@@ -2,7 +2,6 @@
 
 #include <algorithm>
 #include <charconv>
-#include <optional>
 
 #include <fmt/format.h>
 #include <fmt/ranges.h>

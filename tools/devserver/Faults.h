@@ -3,7 +3,6 @@
 #include <cstdint>
 #include <deque>
 #include <expected>
-#include <mutex>
 #include <string>
 #include <string_view>
 #include <vector>

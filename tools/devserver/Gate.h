@@ -2,7 +2,6 @@
 
 #include <chrono>
 #include <memory>
-#include <mutex>
 #include <optional>
 
 #include "platform/base/Mutex.h"

@@ -87,11 +87,6 @@ std::optional<Match> matchQuery(const Entry& entry, const Query& query)
 
 } // namespace
 
-std::optional<Match> matchEntry(const Entry& entry, std::string_view query)
-{
-    return matchQuery(entry, Query(query));
-}
-
 std::vector<Match> findMatches(const Catalogue& catalogue, std::string_view text, const Section* section)
 {
     const Query query(text);

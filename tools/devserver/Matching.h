@@ -22,12 +22,9 @@ struct Match {
     std::optional<std::string> suggestion;
 };
 
-/// Matches a query, ignoring case and diacritics: the query starts a run of words of the title, or each of its words
-/// starts a word of the title or a keyword. Returns nullopt if the query is empty or doesn't match.
-[[nodiscard]] std::optional<Match> matchEntry(const Entry& entry, std::string_view query);
-
 /// Returns all matching entries of one section, or of all sections if null, ordered by quality, then popularity, then
-/// title.
+/// title. Ignoring case and diacritics, the query starts a run of words of the title, or each of its words starts a
+/// word of the title or a keyword. Nothing matches an empty query.
 [[nodiscard]] std::vector<Match> findMatches(const Catalogue& catalogue, std::string_view query,
                                              const Section* section = nullptr);
 

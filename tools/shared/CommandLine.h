@@ -2,7 +2,6 @@
 
 #include <cstddef>
 #include <cstdio>
-#include <initializer_list>
 #include <string>
 #include <string_view>
 #include <utility>

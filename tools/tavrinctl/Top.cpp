@@ -1,7 +1,6 @@
 #include "tools/tavrinctl/Top.h"
 
 #include <algorithm>
-#include <array>
 
 #include <fmt/format.h>
 
