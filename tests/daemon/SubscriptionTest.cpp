@@ -105,13 +105,13 @@ TEST_F(SubscriptionManagerTest, TheHeaderFollowsTheBagTheProvidersAndTheProfile)
     EXPECT_EQ(device.subscriptions.asked.domains, std::vector<std::string>{"d.example"});
     EXPECT_EQ(device.subscriptions.asked.maximumExpiration, 60s);
 
-    device.subscriptions.services = {{"daily", Value::dictionaryOf({{"provider", "daily"}})},
+    device.subscriptions.services = {{"daily", Value::dictionaryOf({{"provider", "dai\x7fly"}})},
                                      {"fuse", Value::dictionaryOf({{"provider", "an impostor"}})}};
     device.subscriptions.handler();
     device.drain();
     device.profile.change({.storefront = "143441", .newsSubscribed = true});
     device.drain();
-    EXPECT_EQ(header(), R"([{"provider":"fuse","attribute":"premium","active":true},{"provider":"daily"}])");
+    EXPECT_EQ(header(), R"([{"provider":"fuse","attribute":"premium","active":true},{"provider":"dai\u007fly"}])");
     EXPECT_EQ(manager->subscriptions().size(), 2u);
     EXPECT_EQ(factory->context().storeFrontIdentifier, "143441");
 
