@@ -29,7 +29,8 @@ enum class Cuts {
 };
 
 /// Cuts the power in a finished life. Calls `look`, which starts the stores on what is left, once for each disk that
-/// differs, and `judge` with every cut and what was found there. Ends with the first failure.
+/// differs, and `judge` with every cut and what was found there. Ends with the first failure. Prints how many there
+/// were.
 template <class Look, class Judge> void afterEachCut(const RecordedDisk& disk, Cuts which, Look look, Judge judge)
 {
     using Luck = RecordedDisk::Luck;
@@ -38,8 +39,10 @@ template <class Look, class Judge> void afterEachCut(const RecordedDisk& disk, C
     const bool all = which == Cuts::All || asked;
     const unsigned seeds = asked ? static_cast<unsigned>(std::strtoul(asked, nullptr, 10)) : all ? 2 : 0;
     std::map<std::size_t, decltype(look())> found; // by the disk's hash
+    std::size_t moments = 0;
     for (std::size_t calls = 0; calls <= disk.calls(); ++calls) {
         if (!all && disk.changesContents(calls)) continue;
+        ++moments;
         std::vector<Luck> lucks{{Kind::Nothing, 0}, {Kind::Everything, 0}, {Kind::Names, 0}};
         if (all) lucks.insert(lucks.end(), {{Kind::NamesAndSizes, 0}, {Kind::Contents, 0}});
         for (unsigned change = 0; change < std::min<std::size_t>(disk.atStake(calls), all ? 3 : 2); ++change) {
@@ -65,6 +68,7 @@ template <class Look, class Judge> void afterEachCut(const RecordedDisk& disk, C
             if (testing::Test::HasFailure()) return;
         }
     }
+    fmt::print("{} moments, {} different disks\n", moments, found.size());
 }
 
 } // namespace platform::test
