@@ -41,7 +41,19 @@ async function openSearch(text, disposition) {
   }
 }
 
+/** Reports that the user has left the address field, if that is still to be reported. */
+function leave() {
+  if (leaving) host.tell({ do: "ended", how: "cancelled" });
+  stay();
+}
+
+function stay() {
+  clearTimeout(leaving);
+  leaving = 0;
+}
+
 api.omnibox.onInputStarted.addListener(() => {
+  leave();
   shown = { query: 0, rows: [] };
   describe();
   host.tell({ do: "started" });
@@ -65,7 +77,7 @@ api.omnibox.onInputChanged.addListener(async (text, suggest) => {
 
 api.omnibox.onInputEntered.addListener(async (text, disposition) => {
   ++newest; // what is still searched for is no longer shown
-  clearTimeout(leaving);
+  stay();
   const row = shown.rows.find(({ content }) => content === text);
   if (row) host.tell({ do: "opened", query: shown.query, result: row.result, suggestion: row.suggestion });
   host.tell({ do: "ended", how: isWebAddress(text) ? "opened" : "searched" });
@@ -76,7 +88,8 @@ api.omnibox.onInputEntered.addListener(async (text, disposition) => {
 // Chromium also says that the input was cancelled just before it was entered.
 api.omnibox.onInputCancelled.addListener(() => {
   ++newest;
-  leaving = setTimeout(() => host.tell({ do: "ended", how: "cancelled" }), 500);
+  stay();
+  leaving = setTimeout(leave, 500);
 });
 
 // The extension's page.

@@ -19,6 +19,7 @@ async function ask(message) {
 text.addEventListener("input", async () => {
   const found = await ask({ do: "search", text: text.value });
   if (!found) return;
+  if (found.rows.length > 0) say("The search daemon answers.", false);
   rows.replaceChildren(...found.rows.map(({ description }) => {
     const row = document.createElement("li");
     row.textContent = description;

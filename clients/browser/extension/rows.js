@@ -14,7 +14,7 @@ export function escapeXml(text) {
 
 /** Returns XML of the text with the words of `typed` marked where a word begins with them. */
 function marked(text, typed) {
-  const words = typed.split(/\s+/u).filter(Boolean).map((word) => word.replace(/[\\^$.*+?()[\]{}|/-]/g, "\\$&"));
+  const words = typed.split(/\s+/u).filter(Boolean).map((word) => word.replace(/[\\^$.*+?()[\]{}|]/g, "\\$&"));
   if (words.length === 0) return escapeXml(text);
   const parts = text.split(new RegExp(`(?<![\\p{L}\\p{N}])(${words.join("|")})`, "giu"));
   return parts.map((part, index) => (index % 2 ? `<match>${escapeXml(part)}</match>` : escapeXml(part))).join("");
