@@ -26,6 +26,7 @@ class Chromium:
              *extensions, "about:blank"],
             env=dict(house.environment, HOME=self.profile), pass_fds=(3, 4), stdout=subprocess.DEVNULL,
             stderr=subprocess.DEVNULL, preexec_fn=lambda: (os.dup2(theirs[0], 3), os.dup2(theirs[1], 4)))
+        house.others.append(self._process)
         for descriptor in [*theirs, pipes[0][0], pipes[1][1]]:
             os.close(descriptor)
         self._commands, self._answers = os.fdopen(pipes[0][1], "wb", 0), os.fdopen(pipes[1][0], "rb", 0)

@@ -13,6 +13,7 @@ import sys
 import tempfile
 import threading
 import time
+import traceback
 import urllib.request
 
 BUILD = pathlib.Path(os.environ.get("BUILD", pathlib.Path(__file__).parents[2] / "build/dev"))
@@ -89,7 +90,12 @@ class House:
                                          self.home / "certificate", "--quiet"], stdout=subprocess.PIPE,
                                         stderr=subprocess.PIPE)
         self.log.pump(self.service.stderr)
-        ready = json.loads(self.service.stdout.readline())
+
+    def open(self):
+        """Waits until the service listens, and makes the daemon's settings."""
+        line = self.service.stdout.readline()
+        check(line, "the service did not start")
+        ready = json.loads(line)
         self.http, self.https, self.certificate = ready["http"], ready["https"], ready["ca"]
         self.environment["SSL_CERT_FILE"] = self.certificate
         self.ctl("defaults", "write", "TAVBagURL", self.https + "/bag")
@@ -118,9 +124,9 @@ class House:
     def stop_daemon(self, how=signal.SIGTERM):
         if not self.daemon:
             return
-        daemon, self.daemon = self.daemon, None
-        daemon.send_signal(how)
-        status = daemon.wait()
+        self.daemon.send_signal(how)
+        status = self.daemon.wait(TIMEOUT)
+        self.daemon = None
         self.reader.join()
         check(status == 0 or how == signal.SIGKILL, f"the daemon ended with status {status}")
 
@@ -206,12 +212,14 @@ def run(case):
     with tempfile.TemporaryDirectory(ignore_cleanup_errors=True) as home:
         house = House(home)
         try:
+            house.open()
             case(house)
             house.stop_service()
             house.stop_daemon()
             check(not house.log.has("runtime error|AddressSanitizer|ThreadSanitizer"), "a sanitizer complained")
-        except Failure as failure:
+        except Exception as failure:  # whatever it is, the log says more
             sys.stdout.flush()
-            sys.exit("\n".join(house.log.lines[-40:]) + f"\nFAILED: {failure}")
+            told = str(failure) if isinstance(failure, Failure) else traceback.format_exc()
+            sys.exit("\n".join(house.log.lines[-40:]) + f"\nFAILED: {told}")
         finally:
             house.end()
