@@ -45,7 +45,8 @@ std::expected<void, std::string> accept(const Options& options)
     sigaddset(&signals, SIGTERM);
     pthread_sigmask(SIG_BLOCK, &signals, nullptr); // before the first thread starts
     devserver::HttpServer server;
-    if (auto bound = server.bind("127.0.0.1", options.port); !bound) return std::unexpected(bound.error());
+    if (auto bound = server.bind("127.0.0.1", options.port); !bound)
+        return std::unexpected(fmt::format("can't listen on port {}: {}", options.port, bound.error()));
     server.start([&](const devserver::Request& request) { return take(options, request); });
     int signal = 0;
     sigwait(&signals, &signal);
@@ -57,7 +58,7 @@ std::expected<void, std::string> accept(const Options& options)
 std::expected<void, std::string> consume(const Options& options)
 {
     auto queue = Queue::connect(options.queue);
-    if (!queue) return std::unexpected(queue.error());
+    if (!queue) return std::unexpected(options.queue + ": " + queue.error());
     if (auto made = queue->makeGroup(); !made) return made;
     auto store = Store::connect(options.store);
     if (!store) return std::unexpected(store.error());

@@ -63,7 +63,7 @@ double peakMemory()
 int run(const Options& options)
 {
     platform::Log::threshold = platform::LogLevel::Fault;
-    const auto bytes = platform::makeSystemFiles()->read(std::filesystem::absolute(options.corpus), kLargestCorpus);
+    const auto bytes = platform::makeSystemFiles()->read(tools::resolved(options.corpus), kLargestCorpus);
     if (!bytes) fail(fmt::format("{}: {}; name the corpus with --corpus", options.corpus, bytes.error().reason()));
     const auto corpus = replay::parseCorpus(bytes->view());
     if (!corpus) fail(fmt::format("{}: {}", options.corpus, corpus.error().reason()));

@@ -60,7 +60,7 @@ double now()
 class Replay {
 public:
     explicit Replay(const Options& options)
-        : _options(options), _client(valueOf(TAVClient::connect(options.address), options.address))
+        : _options(options), _client(valueOf(TAVClient::connect(options.address), "no daemon answers"))
     {
         _client->setTimeout(platform::durationFromSeconds(options.timeout));
         TAVSessionConfiguration configuration(options.identifier, "tavrin-replay/" TAVRIND_VERSION);
@@ -125,7 +125,7 @@ private:
 
 int run(const Options& options)
 {
-    const auto path = std::filesystem::absolute(options.corpus);
+    const auto path = tools::resolved(options.corpus);
     const auto bytes = valueOf(platform::makeSystemFiles()->read(path, kLargestCorpus), "the corpus");
     auto queries = valueOf(parseCorpus(bytes.view()), options.corpus);
     if (options.queries > 0 && options.queries < queries.size()) queries.resize(options.queries);

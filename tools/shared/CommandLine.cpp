@@ -203,6 +203,13 @@ int endOfParsing(const CLI::App& app, const CLI::ParseError& error, const std::s
     return kWrongUsage;
 }
 
+std::filesystem::path resolved(const std::string& path)
+{
+    std::error_code ignored;
+    const auto found = std::filesystem::canonical(path, ignored);
+    return found.empty() ? std::filesystem::absolute(path) : found;
+}
+
 std::size_t controlLength(std::string_view text)
 {
     const auto byte = [&](std::size_t i) { return i < text.size() ? static_cast<unsigned char>(text[i]) : 0xff; };

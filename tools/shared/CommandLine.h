@@ -2,6 +2,7 @@
 
 #include <cstddef>
 #include <cstdio>
+#include <filesystem>
 #include <string>
 #include <string_view>
 #include <utility>
@@ -48,6 +49,8 @@ void useReadableHelp(CLI::App& app);
 /// program. Returns the exit status.
 [[nodiscard]] int endOfParsing(const CLI::App& app, const CLI::ParseError& error, const std::string& program);
 
+/// Returns the absolute path of a file that the user names, with links followed: `platform::Files` follows none.
+[[nodiscard]] std::filesystem::path resolved(const std::string& path);
 /// Writes all of `text` to a stream and flushes it. Returns an error message, or an empty text.
 [[nodiscard]] std::string writeTo(std::FILE* stream, std::string_view text);
 

@@ -43,9 +43,10 @@ std::string whyNotThere(const std::string& identifier, const TAVResourceAnswer& 
     if (!url)
         return fmt::format(
             "the bag lists no {}, so the daemon does not download it; \"tavrinctl bag --json\" shows the bag", name);
-    return fmt::format("{} is not downloaded yet. The daemon downloads it from {}\na minute after it gets a bag, on a "
-                       "network that is not metered; its log shows failures.",
-                       name, printable(url->string()));
+    return fmt::format(
+        "{} is not downloaded yet. The daemon downloads it from {}\none to 61 minutes after it gets a bag, "
+        "on a network that is not metered; its log shows failures.",
+        name, printable(url->string()));
 }
 
 platform::Dictionary describe(const std::string& identifier, const TAVResourceAnswer& answer, const TAVBagAnswer& bag)

@@ -30,10 +30,7 @@ Session openSession(const Options& options)
 
 std::string readFile(const std::string& path, std::size_t maximumSize)
 {
-    std::error_code ignored;
-    const auto found = std::filesystem::canonical(path, ignored);
-    auto bytes =
-        platform::makeSystemFiles()->read(found.empty() ? std::filesystem::absolute(path) : found, maximumSize);
+    auto bytes = platform::makeSystemFiles()->read(tools::resolved(path), maximumSize);
     if (!bytes) throw Failure("can't read " + bytes.error().reason());
     return std::string(bytes->view());
 }

@@ -58,7 +58,10 @@ void top(const Options& options, const TopOptions& mine)
     const auto client = connect(options);
     const bool onScreen = !options.json && isatty(STDIN_FILENO) == 1 && isatty(STDOUT_FILENO) == 1;
     std::unique_ptr<Terminal> terminal;
-    if (onScreen) terminal = std::make_unique<Terminal>();
+    if (onScreen)
+        terminal = std::make_unique<Terminal>();
+    else
+        endOnSignal();
 
     std::deque<TopSample> samples{takeSample(*client)};
     bool ended = false;

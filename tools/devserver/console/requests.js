@@ -122,7 +122,7 @@ export function showRequests() {
       first = oldest;
       if (pause.getAttribute("aria-pressed") !== "true") flush();
     },
-    /** The service or the connection began anew: what follows is everything. */
+    /** The service or the connection began again: what follows is everything. */
     restarted() {
       waiting.clear();
       removeBefore(Infinity);
