@@ -50,12 +50,6 @@ const std::map<std::string_view, std::pair<const char*, const char*>> kLimits{
       "The client sends too many: at most 1,000, or 8 MiB, wait for an upload."}},
 };
 
-std::string said(const Value& value)
-{
-    const std::string* text = value.asString();
-    return text ? printable(*text) : "";
-}
-
 class Doctor {
 public:
     explicit Doctor(const Snapshot& snapshot) : _snapshot(snapshot), _status(snapshot.status) {}

@@ -8,10 +8,10 @@
 
 #include "CoreTavrin/TAVBag.h"
 #include "platform/values/Dictionary.h"
-#include "platform/values/Json.h"
 #include "tools/shared/CommandLine.h"
 #include "tools/tavrinctl/Commands.h"
 #include "tools/tavrinctl/StatusText.h"
+#include "tools/tavrinctl/Tool.h"
 
 namespace tavrin::ctl {
 
@@ -19,12 +19,6 @@ using platform::Dictionary;
 using platform::Value;
 
 namespace {
-
-std::string text(const Value& value)
-{
-    const std::string* string = value.asString();
-    return string ? printable(*string) : platform::toJson(value);
-}
 
 void row(const std::string& name, const std::string& value)
 {
@@ -78,7 +72,7 @@ void showSessions(const Options& options)
     if (options.json) return printJson(sessions);
     if (sessions.empty()) printLine("No client has connected yet.");
     for (const Value& session : sessions)
-        printLine(fmt::format("{:<36} {}", text(session["identifier"]), text(session["agent"])));
+        printLine(fmt::format("{:<36} {}", plain(session["identifier"]), plain(session["agent"])));
 }
 
 void printStatus(const Options& options, const Value& status)
@@ -127,7 +121,7 @@ void showStatistics(const Options& options, bool openMetrics)
     if (openMetrics) return printText(statistics);
     const Dictionary samples = samplesIn(statistics);
     if (options.json) return printJson(samples);
-    for (const auto& [name, value] : samples) printLine(fmt::format("{:>12}  {}", text(value), printable(name)));
+    for (const auto& [name, value] : samples) printLine(fmt::format("{:>12}  {}", plain(value), printable(name)));
 }
 
 } // namespace

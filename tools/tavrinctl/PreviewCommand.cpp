@@ -19,12 +19,6 @@ using platform::Value;
 
 namespace {
 
-std::string shownText(const Value& value)
-{
-    const std::string* text = value.asString();
-    return text ? printable(*text) : "";
-}
-
 /// Saves a body byte for byte as DIR/preview-N.deflate, and returns its path.
 std::string saveBody(const std::string& directory, std::size_t number, const platform::Bytes& body)
 {
@@ -39,14 +33,14 @@ std::string saveBody(const std::string& directory, std::size_t number, const pla
 
 void printUpload(std::size_t number, const Value& upload, const FlushedBody& body)
 {
-    const std::string url = shownText(upload["url"]);
+    const std::string url = said(upload["url"]);
     printLine(
         bold(fmt::format("{}. {}", number,
                          url.empty() ? "nowhere: the bag names no endpoint, so it will be dropped" : "POST " + url)) +
         (upload["open"] == Value(true) ? dim("  (its session has not ended, and may still grow)") : ""));
     if (const Dictionary* headers = upload["headers"].asDictionary())
         for (const auto& [name, value] : *headers)
-            printLine(dim(fmt::format("   {}: {}", printable(name), shownText(value))));
+            printLine(dim(fmt::format("   {}: {}", printable(name), said(value))));
     printLine("   " + summary(body));
     if (const Value::Array* events = body.json["fb"].asArray())
         for (const Value& event : *events)
@@ -87,8 +81,8 @@ void printParts(const char* title, const Value& parts)
 {
     printLine(bold(title));
     for (std::size_t i = 0; i < parts.count(); ++i)
-        printLine(fmt::format("  {} {:<9} {}", padded(shownText(parts[i]["name"]), 38), shownText(parts[i]["from"]),
-                              shownText(parts[i]["value"])));
+        printLine(fmt::format("  {} {:<9} {}", padded(said(parts[i]["name"]), 38), said(parts[i]["from"]),
+                              said(parts[i]["value"])));
 }
 
 void previewSearch(const Options& options, const std::string& query, const std::vector<std::string>& items)
@@ -106,7 +100,7 @@ void previewSearch(const Options& options, const std::string& query, const std::
         return printJson(described);
     }
     if (!skipped.empty()) printLine(bold("Would not be sent: " + skipped + ". Otherwise:"));
-    printLine(fmt::format("{} {}", shownText(preview["method"]), shownText(preview["url"])));
+    printLine(fmt::format("{} {}", said(preview["method"]), said(preview["url"])));
     printParts("Items", preview["items"]);
     printParts("Headers", preview["headers"]);
     printLine(dim("The transport adds Host and Accept-Encoding. A search that memory can answer is not sent at all."));

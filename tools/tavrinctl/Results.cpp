@@ -61,11 +61,8 @@ std::string explain(const Exchange& exchange)
 void printHeaders(const Value& headers)
 {
     if (const Dictionary* dictionary = headers.asDictionary())
-        for (const auto& [name, value] : *dictionary) {
-            const std::string* text = value.asString();
-            printLine(
-                dim(fmt::format("    {}: {}", printable(name), text ? printable(*text) : platform::toJson(value))));
-        }
+        for (const auto& [name, value] : *dictionary)
+            printLine(dim(fmt::format("    {}: {}", printable(name), plain(value))));
 }
 
 void printHttp(const TAVReply& reply)

@@ -8,7 +8,6 @@
 #include "CoreTavrin/ClientVocabulary.h"
 #include "CoreTavrin/TAVBag.h"
 #include "platform/values/Dictionary.h"
-#include "platform/values/Json.h"
 #include "tools/shared/CommandLine.h"
 #include "tools/tavrinctl/Books.h"
 #include "tools/tavrinctl/Tool.h"
@@ -19,12 +18,6 @@ using platform::Dictionary;
 using platform::Value;
 
 namespace {
-
-std::string plain(const Value& value)
-{
-    const std::string* string = value.asString();
-    return string ? printable(*string) : platform::toJson(value);
-}
 
 std::string bagText(const Value& bag)
 {

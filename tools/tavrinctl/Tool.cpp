@@ -3,6 +3,7 @@
 #include <fmt/format.h>
 
 #include "platform/files/Files.h"
+#include "platform/values/Json.h"
 
 namespace tavrin::ctl {
 
@@ -33,6 +34,17 @@ std::string readFile(const std::string& path, std::size_t maximumSize)
     auto bytes = platform::makeSystemFiles()->read(tools::resolved(path), maximumSize);
     if (!bytes) throw Failure("can't read " + bytes.error().reason());
     return std::string(bytes->view());
+}
+
+std::string plain(const platform::Value& value)
+{
+    const std::string* text = value.asString();
+    return text ? printable(*text) : printableJson(platform::toJson(value));
+}
+
+std::string said(const platform::Value& value)
+{
+    return value.asString() ? plain(value) : "";
 }
 
 } // namespace tavrin::ctl

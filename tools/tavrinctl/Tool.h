@@ -54,5 +54,9 @@ template <class T> [[nodiscard]] T valueOf(platform::Result<T> result)
 
 using tools::printable;
 using tools::printableJson;
+/// Returns a text as it can be printed, and the JSON of any other value.
+[[nodiscard]] std::string plain(const platform::Value& value);
+/// Returns a text as it can be printed, and nothing for any other value.
+[[nodiscard]] std::string said(const platform::Value& value);
 
 } // namespace tavrin::ctl
