@@ -208,10 +208,13 @@ Result<std::vector<std::string>> HttpCacheStore::keys()
 Result<std::shared_ptr<const StoredResponse>> HttpCacheStore::find(const std::string& key, const Url& likely)
 {
     std::optional<Row> row;
+    bool incomplete = false;
     auto read =
         _index->run("SELECT answer.id, status, url, headers, selecting, requested, received, public, bodySize, xxh3,"
-                    " body FROM entry JOIN answer ON answer.id = entry.id WHERE key = ?",
+                    " body FROM entry LEFT JOIN answer ON answer.id = entry.id WHERE key = ?",
                     {std::string_view(key)}, [&](const Sqlite::Row& found) {
+                        // Both are in one transaction.
+                        if ((incomplete = found.isNull(0))) return;
                         const auto text = [&](int column) { return std::string(found.text(column)); };
                         row = Row{.id = found.integer(0),
                                   .status = found.integer(1),
@@ -230,6 +233,7 @@ Result<std::shared_ptr<const StoredResponse>> HttpCacheStore::find(const std::st
         if (read.error().code == SQLITE_IOERR) return std::unexpected(damaged("the index can't be read"));
         return std::unexpected(std::move(read.error()));
     }
+    if (incomplete) return std::unexpected(damaged("an entry has no response"));
     if (!row) return nullptr;
 
     const bool mapped = !row->body;
