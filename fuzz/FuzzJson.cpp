@@ -2,6 +2,7 @@
 #include "fuzz/Values.h"
 #include "platform/values/Error.h"
 #include "platform/values/Json.h"
+#include "tests/support/Values.h"
 
 using namespace platform;
 
@@ -29,7 +30,7 @@ void runInput(std::string_view input)
     check(jsonSize(*value) == text.size(), text);
     for (const std::string& written : {text, toJson(*value, JsonStyle::Pretty)}) {
         const auto again = parseJson(written);
-        check(again && fuzz::equalBy(*value, *again, sameJson), written);
+        check(again && test::equalBy(*value, *again, sameJson), written);
         check(toJson(*again) == text, written);
     }
 }

@@ -5,19 +5,11 @@
 #include "platform/values/Error.h"
 #include "platform/values/Json.h"
 #include "platform/values/PropertyList.h"
+#include "tests/support/Values.h"
 
 using namespace platform;
 
 namespace {
-
-/// Compares two values; NaN equals NaN.
-bool same(const Value& a, const Value& b)
-{
-    const auto isNan = [](const Value& value) {
-        return value.type() == Value::Type::Double && std::isnan(*value.asDouble());
-    };
-    return a == b || (isNan(a) && isNan(b));
-}
 
 /// Compares all but what the writer changes: unsigned numbers become reals, dates are rounded.
 bool sameOnceWritten(const Value& read, const Value& again)
@@ -25,7 +17,7 @@ bool sameOnceWritten(const Value& read, const Value& again)
     if (const auto date = read.asDate(); date && again.asDate())
         return std::chrono::abs(*date - *again.asDate()) <= std::chrono::microseconds(1);
     if (read.type() == Value::Type::UInt) return again == Value(*read.asDouble());
-    return same(read, again);
+    return test::same(read, again);
 }
 
 bool mayBeRefused(const Value& value)
@@ -54,8 +46,8 @@ void runInput(std::string_view input)
     }
     const auto again = parsePropertyList(*written);
     check(again.has_value(), again ? "" : again.error().reason());
-    check(fuzz::equalBy(*value, *again, sameOnceWritten), toJson(*value) + " became " + toJson(*again));
+    check(test::equalBy(*value, *again, sameOnceWritten), toJson(*value) + " became " + toJson(*again));
 
     const auto third = parsePropertyList(toPropertyList(*again).value());
-    check(third && fuzz::equalBy(*again, *third, same), toJson(*again));
+    check(third && test::same(*again, *third), toJson(*again));
 }

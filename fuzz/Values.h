@@ -2,7 +2,6 @@
 
 #include <algorithm>
 #include <charconv>
-#include <cmath>
 #include <string>
 #include <string_view>
 
@@ -69,20 +68,6 @@ inline std::size_t depthOf(const Value& value)
     if (const platform::Dictionary* dictionary = value.asDictionary())
         for (const auto& [key, entry] : *dictionary) deepest = std::max(deepest, depthOf(entry) + 1);
     return deepest;
-}
-
-/// Whether `leaf` holds for every value of two trees that have the same arrays, keys and leaves.
-template <class Leaf> bool equalBy(const Value& a, const Value& b, Leaf leaf)
-{
-    const auto equal = [&](const Value& x, const Value& y) { return equalBy(x, y, leaf); };
-    if (a.asArray() && b.asArray()) return std::ranges::equal(*a.asArray(), *b.asArray(), equal);
-    if (a.asDictionary() && b.asDictionary()) {
-        return a.count() == b.count() && std::ranges::all_of(*a.asDictionary(), [&](const auto& entry) {
-                   const Value* other = b.asDictionary()->find(entry.first);
-                   return other && equal(entry.second, *other);
-               });
-    }
-    return leaf(a, b);
 }
 
 /// Whether `holds` for any value of a tree. Keys of dictionaries count as texts.

@@ -10,6 +10,7 @@
 #include "platform/values/Archive.h"
 #include "platform/values/Record.h"
 #include "platform/values/ValueCoder.h"
+#include "tests/support/Values.h"
 
 /// Bus messages without a peer.
 namespace platform::test {
@@ -60,7 +61,7 @@ inline std::string differenceOfRoads(const ipc::BusMessage& message, const Recor
     const auto refused = decodedFromStart(message, values->size - 1, records);
     if (refused || refused.error().name != SD_BUS_ERROR_LIMITS_EXCEEDED) return "the limit is not kept";
     const auto record = recordFromValue(values->message.args[0], classes());
-    if (!direct) return values->message.args == straight->message.args ? "" : "the values differ";
+    if (!direct) return same(values->message.args, straight->message.args) ? "" : "the values differ";
     if (!record) return "a record that is none: " + record.error().reason();
     return archive(**record) == archive(*straight->message.record(0)) ? "" : "the records differ";
 }
@@ -77,7 +78,7 @@ inline std::string differenceOfMessages(const std::shared_ptr<const Record>& rec
     if (sizes[0] != sizes[1]) return "the sizes differ";
     const auto a = decodedFromStart(straight, SIZE_MAX, {});
     const auto b = decodedFromStart(byValue, SIZE_MAX, {});
-    return a && b && a->message.args == b->message.args ? "" : "the messages differ";
+    return a && b && same(a->message.args, b->message.args) ? "" : "the messages differ";
 }
 
 } // namespace platform::test
