@@ -274,6 +274,15 @@ TEST_F(BagControllerTest, AnAnnouncedVersionThatNeverComesIsFetchedOnce)
     EXPECT_EQ(tasks().size(), 4u) << "a fetch that failed is repeated at once";
 }
 
+TEST_F(BagControllerTest, ABagThatIsLargerOnDiskComesBack)
+{
+    start();
+    deliverBag(R"({"version": 7, "text": "\u00fc)" + std::string(5u << 20, 'a') + "\"}");
+    start();
+    ASSERT_TRUE(controller().inMemoryBag());
+    EXPECT_EQ(controller().inMemoryBag()->version(), "7");
+}
+
 TEST_F(BagControllerTest, AFetchThatNeverEndsIsGivenUp)
 {
     start();
