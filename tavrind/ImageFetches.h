@@ -45,9 +45,9 @@ public:
     /// Limit of waiting fetches in a lane: an answer or a client may name any number of images.
     static constexpr std::size_t kWaiting = 10'000;
 
-    /// Returns whether the URL is listed. If it is, and `group` isn't null, adds `group` to its fetch. A group that
-    /// joins again before another one is added once. A waiting prefetch then moves to the lane of images that a client
-    /// waits for, unless that is full.
+    /// Returns whether the URL is listed. If it is, and `group` isn't null, adds `group` to its fetch; a group that was
+    /// the last one added is not added again. A waiting prefetch then moves to the lane of images that a client waits
+    /// for, unless that lane is full.
     bool join(const platform::Url& url, const ImageGroup& group);
     /// Adds the fetch of a URL that is not listed: for a client if `group` isn't null, else as a prefetch. Returns
     /// false if its lane is full.

@@ -78,6 +78,7 @@ enum UrlErrorCode : std::int64_t {
     kUrlForbiddenRedirect =
         -1201, ///< to another scheme, to an address that isn't public, or with a body to another host
 };
+/// Returns an error of URL loading. Any thread.
 [[nodiscard]] inline Error urlError(std::int64_t code, std::string reason)
 {
     return Error::withReason(kUrlErrorDomain, code, std::move(reason));

@@ -170,7 +170,8 @@ struct Queue::Core {
             --shared;
         resume();
     }
-    /// Once the suspending task and all its suspensions have ended, puts their continuations first.
+    /// Puts the continuations first, in the order of the calls, once the suspending task and all its suspensions have
+    /// ended.
     void resume() REQUIRES(mutex)
     {
         if (exclusive || !std::ranges::all_of(suspensions, [](const auto& each) { return each->over.load(); })) return;

@@ -46,8 +46,8 @@ private:
     std::vector<std::string> _names;
 };
 
-/// Reads one field from nowhere: each read returns a value that differs from zero and from those before. A field that
-/// holds records gets new ones of class `nested`.
+/// A decoder without input, for one field: each read returns a new value, which is never zero. A field that holds
+/// records gets new ones of class `nested`.
 class Filler final : public platform::Decoder {
 public:
     Filler(const platform::RecordClasses& classes, std::string nested, std::int64_t& number)
@@ -123,7 +123,7 @@ private:
 };
 
 /// Sets every field of a record, and returns what each was given. Fields that hold records get the first class that
-/// they take; a field that takes nothing is missing in the answer.
+/// they take; a field that takes nothing is missing in the result.
 inline std::map<std::string, Value> fill(platform::Record& record, const platform::RecordClasses& classes)
 {
     std::map<std::string, Value> given;

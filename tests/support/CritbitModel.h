@@ -10,7 +10,7 @@
 
 namespace tavrin::test {
 
-/// A crit-bit tree beside a map that must always hold the same. Each operation is done on both and returns whether they
+/// A crit-bit tree and a map with the same contents. Each operation changes or reads both, and returns whether they
 /// agree. Values are small numbers; those that the tree released are counted.
 class CritbitModel {
 public:

@@ -24,7 +24,7 @@ struct Match {
 
 /// Returns all matching entries of one section, or of all sections if null, ordered by quality, then popularity, then
 /// title. Ignoring case and diacritics, the query starts a run of words of the title, or each of its words starts a
-/// word of the title or a keyword. Nothing matches an empty query.
+/// word of the title or a keyword. An empty query matches nothing.
 [[nodiscard]] std::vector<Match> findMatches(const Catalogue& catalogue, std::string_view query,
                                              const Section* section = nullptr);
 

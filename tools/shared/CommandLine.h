@@ -54,11 +54,12 @@ void useReadableHelp(CLI::App& app);
 /// Writes all of `text` to a stream and flushes it. Returns an error message, or an empty text.
 [[nodiscard]] std::string writeTo(std::FILE* stream, std::string_view text);
 
-/// Returns the bytes that the control character takes with which a text begins. Returns 0 if it begins otherwise.
+/// Returns the size in bytes of the control character at the beginning of a text, or 0 if there is none.
 [[nodiscard]] std::size_t controlLength(std::string_view text);
 /// Replaces control characters by blanks, so that a text that others chose can't control the terminal.
 [[nodiscard]] std::string printable(std::string_view text);
-/// Escapes the control characters that JSON allows in strings. The value stays the same.
+/// Escapes the control characters that JSON texts may contain: DEL, and those beyond ASCII. The result parses to the
+/// same value.
 [[nodiscard]] std::string printableJson(std::string_view json);
 
 } // namespace tavrin::tools
