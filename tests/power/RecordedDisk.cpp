@@ -24,12 +24,6 @@ namespace {
 
 constexpr std::size_t kPage = 4096;
 
-[[noreturn]] void missed(const char* what, const char* path)
-{
-    std::fprintf(stderr, "a change of the disk that nobody has seen coming: %s %s\n", what, path);
-    std::abort();
-}
-
 } // namespace
 
 /// What survives, decision by decision.
@@ -75,8 +69,9 @@ RecordedDisk::RecordedDisk()
     struct stat status{};
     stat(root.c_str(), &status);
     _device = status.st_dev;
-    _nodes[status.st_ino] = "";
-    _isDirectory[status.st_ino] = true;
+    _root = status.st_ino;
+    _nodes[_root] = "";
+    _isDirectory[_root] = true;
     recorder = this;
 }
 
@@ -112,7 +107,10 @@ void RecordedDisk::changeEntries(const char* removed, const char* added)
     auto from = removed ? placeOf(removed) : std::nullopt;
     auto to = added ? placeOf(added) : std::nullopt;
     if (!from && !to) return;
-    if (removed && added && (!from || !to)) missed("a rename from or to elsewhere", added);
+    if (removed && added && (!from || !to)) {
+        std::fprintf(stderr, "a rename from or to elsewhere, which is not remembered: %s\n", added);
+        std::abort();
+    }
     Node node = 0;
     struct stat status{};
     if (added && stat(added, &status) == 0) {
@@ -123,31 +121,28 @@ void RecordedDisk::changeEntries(const char* removed, const char* added)
     _calls.push_back({.kind = Call::Kind::Entries, .node = node, .removed = std::move(from), .added = std::move(to)});
 }
 
-void RecordedDisk::write(int file, off_t offset, std::size_t size, const char* data)
+void RecordedDisk::noteCall(int file, Call call)
 {
     const auto node = nodeOf(file);
     if (!node) return;
+    call.node = *node;
     _callsOf[*node].push_back(_calls.size());
-    _calls.push_back({.kind = Call::Kind::Write,
-                      .node = *node,
-                      .offset = static_cast<std::size_t>(offset),
-                      .data = std::string(data, size)});
+    _calls.push_back(std::move(call));
+}
+
+void RecordedDisk::write(int file, off_t offset, std::string data)
+{
+    noteCall(file, {.kind = Call::Kind::Write, .offset = static_cast<std::size_t>(offset), .data = std::move(data)});
 }
 
 void RecordedDisk::truncate(int file, off_t size)
 {
-    const auto node = nodeOf(file);
-    if (!node) return;
-    _callsOf[*node].push_back(_calls.size());
-    _calls.push_back({.kind = Call::Kind::Truncate, .node = *node, .offset = static_cast<std::size_t>(size)});
+    noteCall(file, {.kind = Call::Kind::Truncate, .offset = static_cast<std::size_t>(size)});
 }
 
 void RecordedDisk::sync(int fileOrDirectory)
 {
-    const auto node = nodeOf(fileOrDirectory);
-    if (!node) return;
-    _callsOf[*node].push_back(_calls.size());
-    _calls.push_back({.kind = Call::Kind::Sync, .node = *node});
+    noteCall(fileOrDirectory, {.kind = Call::Kind::Sync});
 }
 
 bool RecordedDisk::changesContents(std::size_t call) const
@@ -280,9 +275,7 @@ RecordedDisk::Image RecordedDisk::after(std::size_t calls, Luck luck) const
             }
         }
     };
-    struct stat status{};
-    stat(root.c_str(), &status);
-    fill(fill, status.st_ino, "");
+    fill(fill, _root, "");
     return image;
 }
 
@@ -317,24 +310,6 @@ namespace {
 
 using platform::test::recorder;
 
-bool exists(const char* path)
-{
-    struct stat status{};
-    return lstat(path, &status) == 0;
-}
-
-int opened(const char* path, int flags, mode_t mode)
-{
-    const bool adds = recorder && (flags & O_CREAT) != 0 && !exists(path);
-    const auto file = static_cast<int>(syscall(SYS_openat, AT_FDCWD, path, flags, mode));
-    if (file < 0 || !recorder) return file;
-    if (adds)
-        recorder->changeEntries(nullptr, path);
-    else if ((flags & O_TRUNC) != 0)
-        recorder->truncate(file, 0);
-    return file;
-}
-
 /// Where a write without an offset goes.
 off_t positionOf(int file)
 {
@@ -349,7 +324,8 @@ template <class Write> ssize_t written(int file, off_t offset, Write write, cons
     if (!recorder || size <= 0) return size;
     std::string data;
     for (int i = 0; i < count; ++i) data.append(static_cast<const char*>(parts[i].iov_base), parts[i].iov_len);
-    recorder->write(file, offset, static_cast<std::size_t>(size), data.data());
+    data.resize(static_cast<std::size_t>(size));
+    recorder->write(file, offset, std::move(data));
     return size;
 }
 
@@ -357,13 +333,6 @@ int synced(long call, int file)
 {
     const auto result = static_cast<int>(syscall(call, file));
     if (result == 0 && recorder) recorder->sync(file);
-    return result;
-}
-
-int truncated(int file, off_t size)
-{
-    const auto result = static_cast<int>(syscall(SYS_ftruncate, file, size));
-    if (result == 0 && recorder) recorder->truncate(file, size);
     return result;
 }
 
@@ -387,16 +356,15 @@ int open(const char* path, int flags, ...)
     va_start(arguments, flags);
     const auto mode = (flags & O_CREAT) != 0 ? va_arg(arguments, mode_t) : 0;
     va_end(arguments);
-    return opened(path, flags, mode);
-}
-
-int open64(const char* path, int flags, ...)
-{
-    va_list arguments;
-    va_start(arguments, flags);
-    const auto mode = (flags & O_CREAT) != 0 ? va_arg(arguments, mode_t) : 0;
-    va_end(arguments);
-    return opened(path, flags, mode);
+    struct stat status{};
+    const bool adds = recorder && (flags & O_CREAT) != 0 && lstat(path, &status) != 0;
+    const auto file = static_cast<int>(syscall(SYS_openat, AT_FDCWD, path, flags, mode));
+    if (file < 0 || !recorder) return file;
+    if (adds)
+        recorder->changeEntries(nullptr, path);
+    else if ((flags & O_TRUNC) != 0)
+        recorder->truncate(file, 0);
+    return file;
 }
 
 ssize_t write(int file, const void* data, size_t size)
@@ -410,11 +378,6 @@ ssize_t pwrite(int file, const void* data, size_t size, off_t offset)
 {
     const iovec part{const_cast<void*>(data), size};
     return written(file, offset, [&] { return syscall(SYS_pwrite64, file, data, size, offset); }, &part, 1);
-}
-
-ssize_t pwrite64(int file, const void* data, size_t size, off64_t offset)
-{
-    return pwrite(file, data, size, offset);
 }
 
 ssize_t writev(int file, const iovec* parts, int count)
@@ -431,19 +394,21 @@ ssize_t copy_file_range(int from, off64_t* fromOffset, int to, off64_t* toOffset
     if (copied <= 0 || !recorder) return copied;
     std::string data(static_cast<std::size_t>(copied), '\0');
     if (syscall(SYS_pread64, from, data.data(), data.size(), source) == copied)
-        recorder->write(to, offset, data.size(), data.data());
+        recorder->write(to, offset, std::move(data));
     return copied;
 }
 
 int ftruncate(int file, off_t size) noexcept
 {
-    return truncated(file, size);
+    const auto result = static_cast<int>(syscall(SYS_ftruncate, file, size));
+    if (result == 0 && recorder) recorder->truncate(file, size);
+    return result;
 }
 
-int ftruncate64(int file, off64_t size) noexcept
-{
-    return truncated(file, size);
-}
+// The same calls by their other names.
+int open64(const char* path, int flags, ...) __attribute__((alias("open")));
+ssize_t pwrite64(int file, const void* data, size_t size, off64_t offset) __attribute__((alias("pwrite")));
+int ftruncate64(int file, off64_t size) noexcept __attribute__((alias("ftruncate")));
 
 int fsync(int file)
 {

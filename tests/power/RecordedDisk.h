@@ -78,7 +78,7 @@ public:
 
     // For the system calls.
     void changeEntries(const char* removed, const char* added);
-    void write(int file, off_t offset, std::size_t size, const char* data);
+    void write(int file, off_t offset, std::string data);
     void truncate(int file, off_t size);
     void sync(int fileOrDirectory);
 
@@ -92,12 +92,13 @@ private:
     struct Call {
         enum class Kind { Entries, Write, Truncate, Sync };
         Kind kind;
-        Node node;
+        Node node = 0;
         std::optional<Place> removed, added; ///< of Entries
         std::size_t offset = 0;              ///< of Write; the size, of Truncate
         std::string data;
     };
     class Dice;
+    void noteCall(int file, Call call);
     [[nodiscard]] std::optional<Place> placeOf(const char* path) const;
     [[nodiscard]] std::optional<Node> nodeOf(int file) const;
     /// For each call that changes directories, in their order.
@@ -105,6 +106,7 @@ private:
     [[nodiscard]] std::string contentsOf(Node node, std::size_t calls, Dice& dice) const;
 
     dev_t _device = 0;
+    Node _root = 0;
     std::map<Node, std::string> _nodes; ///< with their first paths
     std::map<Node, bool> _isDirectory;
     std::vector<Call> _calls;
