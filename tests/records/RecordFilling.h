@@ -3,7 +3,6 @@
 #include <map>
 #include <memory>
 #include <string>
-#include <vector>
 
 #include "platform/values/Dictionary.h"
 #include "platform/values/Record.h"
@@ -16,35 +15,6 @@ using platform::Bytes;
 using platform::Date;
 using platform::Dictionary;
 using platform::Value;
-
-/// The names of a record's fields, in their order.
-class FieldNames final : public platform::Encoder {
-public:
-    static std::vector<std::string> of(const platform::Record& record)
-    {
-        FieldNames encoder;
-        record.encodeFields(encoder);
-        return encoder._names;
-    }
-
-private:
-    void beginRecord(std::string_view, std::size_t) override {}
-    void key(std::string_view name) override { _names.emplace_back(name); }
-    void endRecord() override {}
-    void beginArray(std::size_t) override {}
-    void endArray() override {}
-    void null() override {}
-    void boolean(bool) override {}
-    void integer(std::int64_t) override {}
-    void unsignedInteger(std::uint64_t) override {}
-    void real(double) override {}
-    void string(std::string_view) override {}
-    void bytes(const Bytes&) override {}
-    void date(Date) override {}
-    void value(const Value&) override {}
-
-    std::vector<std::string> _names;
-};
 
 /// A decoder without input, for one field: each read returns a new value, which is never zero. A field that holds
 /// records gets new ones of class `nested`.
@@ -128,7 +98,8 @@ inline std::map<std::string, Value> fill(platform::Record& record, const platfor
 {
     std::map<std::string, Value> given;
     std::int64_t number = 5'000'000'000; // more than 32 bits
-    for (const std::string& name : FieldNames::of(record)) {
+    for (const platform::Record::FieldReader& field : record.fieldReaders()) {
+        const std::string name(field.name);
         for (const auto& [nested, factory] : classes) {
             Filler filler(classes, std::string(nested), number);
             if (std::size_t next = 0; !record.decodeField(name, filler, next) || filler.failed()) continue;
