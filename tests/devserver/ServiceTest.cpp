@@ -188,16 +188,6 @@ TEST_F(ServiceTest, StreamsAreLimitedAndEndWithTheirConnections)
     EXPECT_EQ(get("/control/events").status, 200);
 }
 
-TEST_F(ServiceTest, TheBagIsCheckedByTheDaemonsRules)
-{
-    const auto checked = [this](const char* bag) {
-        return platform::toJson(json(service.answer(request("POST", "/control/bag/check", bag)))["problems"]);
-    };
-    EXPECT_EQ(checked(R"({"isEnabled": true, "clients": {"news": {}}})"), "[]");
-    EXPECT_TRUE(checked(R"({"isEnabled": "yes"})").contains("isEnabled"));
-    EXPECT_EQ(platform::toJson(json(get("/control/bag"))["problems"]), "[]") << "its own bag is right";
-}
-
 TEST_F(ServiceTest, TheLogShowsRequestsButNoControlCallsAndNoSecrets)
 {
     Request search = request("GET", "/search?q=weather&locale=de_CH");

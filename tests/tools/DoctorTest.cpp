@@ -19,20 +19,14 @@ Value json(const char* text)
     return platform::parseJson(text).value();
 }
 
-/// Sets the value at a path of keys.
-void set(Value& value, std::initializer_list<const char*> path, const Value& to)
+/// Sets the value at a path of keys, parted by dots.
+void set(Value& value, const std::string& path, const Value& to)
 {
-    Value inner = to;
-    if (path.size() > 1) {
-        inner = value[*path.begin()];
-        if (!inner.asDictionary()) inner = Dictionary();
-        const std::vector<const char*> rest(path.begin() + 1, path.end());
-        if (rest.size() == 1)
-            set(inner, {rest[0]}, to);
-        else
-            set(inner, {rest[0], rest[1]}, to);
-    }
-    value.mutableDictionary().set(*path.begin(), inner);
+    const auto dot = path.find('.');
+    const std::string key = path.substr(0, dot);
+    Value inner = dot == path.npos ? to : value[key];
+    if (dot != path.npos) set(inner, path.substr(dot + 1), to);
+    value.mutableDictionary().set(key, inner);
 }
 
 /// A device on which all is in order.
@@ -70,18 +64,18 @@ TEST(Doctor, FindsEachThingThatIsBrokenAndSaysWhatToDo)
 {
     const auto failed = [](const char* reason, std::int64_t code) {
         return [reason, code](Snapshot& s) {
-            set(s.status, {"bag", "lastFetch", "reason"}, reason);
-            set(s.status, {"bag", "lastFetch", "code"}, code);
+            set(s.status, "bag.lastFetch.reason", reason);
+            set(s.status, "bag.lastFetch.code", code);
         };
     };
     const auto dropped = [](const char* reason) {
         return [reason](Snapshot& s) {
-            set(s.status, {"feedback", "recorded"}, 5);
-            set(s.status, {"feedback", "dropped", reason}, 2);
+            set(s.status, "feedback.recorded", 5);
+            set(s.status, "feedback.dropped." + std::string(reason), 2);
         };
     };
     const auto upload = [](const char* task) {
-        return [task](Snapshot& s) { set(s.waiting, {"uploads"}, Value::Array{json(task)}); };
+        return [task](Snapshot& s) { set(s.waiting, "uploads", Value::Array{json(task)}); };
     };
     constexpr auto kFine = Severity::Fine, kWarning = Severity::Warning, kError = Severity::Error;
     const struct {
@@ -94,26 +88,22 @@ TEST(Doctor, FindsEachThingThatIsBrokenAndSaysWhatToDo)
         {[](Snapshot& s) { s.connectProblem = "Connection refused", s.status = s.waiting = Value(); }, kError, "daemon",
          "no daemon answers at unix:path=/run/socket (Connection refused)", "systemctl --user start"},
         {[](Snapshot& s) { s.toolVersion = "1.3"; }, kWarning, "daemon", "tavrinctl is of version 1.3", "Restart it"},
-        {[](Snapshot& s) { set(s.status, {"flushingStopped"}, true); }, kWarning, "daemon", "stopped", "flush dump"},
-        {[&](Snapshot& s) {
-             failed("Couldn't connect: refused", -1004)(s), set(s.status, {"bag", "version"}, Value());
-         },
+        {[](Snapshot& s) { set(s.status, "flushingStopped", true); }, kWarning, "daemon", "stopped", "flush dump"},
+        {[&](Snapshot& s) { failed("Couldn't connect: refused", -1004)(s), set(s.status, "bag.version", Value()); },
          kError, "bag", "there is no bag; last fetch 5 s ago: refused", "Is the service up"},
-        {[&](Snapshot& s) { failed("statusCode 503", 2)(s), set(s.status, {"bag", "lastFetch", "status"}, 503); },
-         kWarning, "bag", "the service answered 503", "TAVBagURL"},
+        {[&](Snapshot& s) { failed("statusCode 503", 2)(s), set(s.status, "bag.lastFetch.status", 503); }, kWarning,
+         "bag", "the service answered 503", "TAVBagURL"},
         {failed("SSL: SSL certificate problem: self-signed certificate", -1200), kError, "certificates",
          "self-signed certificate", "update-ca-certificates"},
-        {[](Snapshot& s) { set(s.status, {"bag", "enabled"}, false); }, kWarning, "bag", "disables search",
-         "isEnabled"},
+        {[](Snapshot& s) { set(s.status, "bag.enabled", false); }, kWarning, "bag", "disables search", "isEnabled"},
         {[](Snapshot& s) { s.bagProblems = {"searchURL: expected a URL"}; }, kWarning, "bag", "searchURL", "Correct"},
         {[](Snapshot& s) { s.authorities.problem = "No such file"; }, kError, "certificates", "/etc/ssl/ca.crt",
          "SSL_CERT_FILE"},
         {[](Snapshot& s) { s.hosts[0].problem = "Name or service not known"; }, kError, "names", "b.example", "getent"},
-        {[](Snapshot& s) { set(s.status, {"bag", "lastFetch", "at"}, 1700000995); }, kWarning, "clock",
-         "16 min 45 s ahead of", "timedatectl"},
-        {[](Snapshot& s) { set(s.status, {"bag", "lastFetch", "at"}, 1600000000); }, kError, "clock", "behind",
+        {[](Snapshot& s) { set(s.status, "bag.lastFetch.at", 1700000995); }, kWarning, "clock", "16 min 45 s ahead of",
          "timedatectl"},
-        {[](Snapshot& s) { set(s.status, {"bag", "expiresIn"}, 90000); }, kWarning, "clock", "set back", "timedatectl"},
+        {[](Snapshot& s) { set(s.status, "bag.lastFetch.at", 1600000000); }, kError, "clock", "behind", "timedatectl"},
+        {[](Snapshot& s) { set(s.status, "bag.expiresIn", 90000); }, kWarning, "clock", "set back", "timedatectl"},
         {[](Snapshot& s) { s.directories[0].problem = "Permission denied"; }, kError, "directories",
          "/c (caches): Permission denied", "own it"},
         {[](Snapshot& s) { s.directories[0].mode = 0755; }, kWarning, "directories", "mode 0755", "chmod 700 /c"},
@@ -132,7 +122,7 @@ TEST(Doctor, FindsEachThingThatIsBrokenAndSaysWhatToDo)
         {upload(R"({"waitsFor": "unmetered network", "failures": 0})"), kFine, "transfers",
          "1 uploads waiting for unmetered network", ""},
         {[](Snapshot& s) {
-             set(s.waiting, {"activities"},
+             set(s.waiting, "activities",
                  Value::Array{
                      json(R"({"identifier": "ingest", "state": "waiting", "inSeconds": 5, "waitsFor": "power"})")});
          },
@@ -141,7 +131,7 @@ TEST(Doctor, FindsEachThingThatIsBrokenAndSaysWhatToDo)
          "dump"},
         {dropped("bufferFull"), kWarning, "limits", "2 events were dropped: too many records", "sends too many"},
         {dropped("endpointUnset"), kWarning, "limits", "no place to upload", "feedbackURL"},
-        {[](Snapshot& s) { set(s.status, {"feedback", "recorded"}, 4); }, kError, "limits", "don't close", "report"},
+        {[](Snapshot& s) { set(s.status, "feedback.recorded", 4); }, kError, "limits", "don't close", "report"},
     };
     for (const auto& each : cases) {
         Snapshot snapshot = healthy();

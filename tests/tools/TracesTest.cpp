@@ -1,7 +1,6 @@
 #include "CoreTavrin/Traces.h"
 
 #include <fstream>
-#include <set>
 
 #include <fmt/format.h>
 #include <gmock/gmock.h>
@@ -21,11 +20,6 @@ constexpr const char* kMarker = "MARKER-of-a-user";
 struct TracesTest : testing::Test {
     TracesTest()
     {
-        for (auto* path : {&directories.caches, &directories.config, &directories.state, &directories.data,
-                           &directories.temporary}) {
-            *path = temporary / std::to_string(names.size());
-            names.insert(path->string());
-        }
         for (const char* file : {"session.3", "bag.plist", "TAVQIFeatures", "http/index.db", "http/1.body"})
             write(directories.caches / service / file);
         for (const char* file : {"counters.json", "feedback-books.json", "activities.json", "privacy/ledger",
@@ -64,8 +58,11 @@ struct TracesTest : testing::Test {
 
     const platform::test::TemporaryDirectory temporary;
     const char* service = "com.quorvane.tavrind";
-    std::set<std::string> names;
-    platform::Directories directories;
+    const platform::Directories directories{.caches = temporary / "caches",
+                                            .config = temporary / "config",
+                                            .state = temporary / "state",
+                                            .data = temporary / "data",
+                                            .temporary = temporary / "tmp"};
 };
 
 TEST_F(TracesTest, NothingOfAUserIsLeft)
