@@ -7,6 +7,7 @@ import os
 import pathlib
 import re
 import signal
+import ssl
 import struct
 import subprocess
 import sys
@@ -22,6 +23,7 @@ TAVRINCTL = BUILD / "tools/tavrinctl/tavrinctl"
 DEVSERVER = BUILD / "tools/devserver/tavrin-devserver"
 REPLAY = BUILD / "tools/replay/tavrin-replay"
 FILTERED = pathlib.Path(__file__).parent / "filtered"
+CLIENTS = pathlib.Path(__file__).resolve().parents[2] / "clients"
 os.environ["no_proxy"] = "*"  # whatever proxy the environment has
 TIMEOUT = 60  # seconds for anything to happen, on a busy machine
 
@@ -121,6 +123,18 @@ class House:
         check(b"istening" in line, f"systemd-socket-activate: {line}")
         self.reader = self.log.pump(self.daemon.stderr)
 
+    def begin(self, what="no search was answered", **options):
+        """Starts the daemon, which must answer a search."""
+        self.start_daemon(**options)
+        check(self.answered(), what)
+
+    def restart_daemon(self, with_bag=True):
+        """Stops the daemon and starts it again, with the bag on disk or without one."""
+        self.stop_daemon()
+        if not with_bag:
+            (self.cache / "bag.plist").unlink(missing_ok=True)
+        self.start_daemon()
+
     def stop_daemon(self, how=signal.SIGTERM):
         if not self.daemon:
             return
@@ -157,6 +171,28 @@ class House:
         """True if one of five searches is answered. Each waits up to a second for the bag; a busy machine may need longer."""
         return any(self.outcome() == "answered" for _ in range(5))
 
+    def report(self, records, *options):
+        """Reports events in a connection of its own."""
+        return self.ctl(*options, "feedback", "send", "-", input=json.dumps(records).encode())
+
+    def dump(self):
+        """Has the daemon upload all that was recorded."""
+        check(self.ctl("flush", "dump").returncode == 0, "no flush")
+
+    def uploaded(self, agent):
+        """Uploads all that was recorded. Returns the agent's events that the service has."""
+        self.dump()
+        self.all_sent()
+        return [event for upload in self.control("uploads") if upload["agent"] == agent for event in upload["json"]["fb"]]
+
+    def all_sent(self):
+        self.soon(lambda: self.books()["uploading"] == 0, "uploads go on and on")
+
+    def picture(self, name, size):
+        """The size of a picture that comes within ten seconds, else 0."""
+        return self.json("images", "--url", f"{self.https}/images/{name}?size={size}", "--within", "10", "-o",
+                         self.directory("pictures")).get("bytes", 0)
+
     def books(self):
         """The feedback counters. Every recorded event is in one place, or was dropped for a reason."""
         books = self.json("status")["feedback"]
@@ -179,6 +215,11 @@ class House:
     def clear_faults(self):
         self.control("faults/clear", post=True)
         self.control("release", post=True)
+
+    def fetch(self, path):
+        """What the service sends, over HTTPS."""
+        with urllib.request.urlopen(self.https + path, context=ssl.create_default_context(cafile=self.certificate)) as reply:
+            return reply.read()
 
     def requests(self, endpoint):
         return self.control("status")["by_endpoint"].get(endpoint, 0)

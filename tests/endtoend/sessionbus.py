@@ -3,9 +3,9 @@ import configparser
 import pathlib
 import subprocess
 
-from house import TIMEOUT, check
+from house import CLIENTS, TIMEOUT, check
 
-PROVIDER = pathlib.Path(__file__).resolve().parents[2] / "clients/search-provider"
+PROVIDER = CLIENTS / "search-provider"
 CONFIGURATION = """<busconfig><type>session</type><listen>unix:dir={0}</listen><servicedir>{0}</servicedir><policy context="default">
 <allow send_destination="*" eavesdrop="true"/><allow eavesdrop="true"/><allow own="*"/></policy></busconfig>"""
 
