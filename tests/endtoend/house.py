@@ -25,6 +25,8 @@ REPLAY = BUILD / "tools/replay/tavrin-replay"
 FILTERED = pathlib.Path(__file__).parent / "filtered"
 CLIENTS = pathlib.Path(__file__).resolve().parents[2] / "clients"
 os.environ["no_proxy"] = "*"  # whatever proxy the environment has
+BUS = """<busconfig><type>session</type><listen>unix:dir={0}</listen><servicedir>{0}</servicedir><policy context="default">
+<allow user="*"/><allow own="*"/><allow send_destination="*" eavesdrop="true"/><allow eavesdrop="true"/></policy></busconfig>"""
 TIMEOUT = 60  # seconds for anything to happen, on a busy machine
 
 
@@ -105,6 +107,18 @@ class House:
     def directory(self, name):
         (self.home / name).mkdir(mode=0o700, exist_ok=True)
         return str(self.home / name)
+
+    def start_bus(self, directory, environment):
+        """Starts a message bus, which starts the programs of the directory. Returns its process, the thread that reads its log, and
+        its address."""
+        configuration = pathlib.Path(directory, "bus.conf")
+        configuration.write_text(BUS.format(directory))
+        bus = subprocess.Popen(["dbus-daemon", "--nofork", f"--config-file={configuration}", "--print-address=1"], env=environment,
+                               stdout=subprocess.PIPE, stderr=subprocess.PIPE)
+        self.others.append(bus)
+        address = bus.stdout.readline().decode().strip()
+        check(address, "no message bus")
+        return bus, self.log.pump(bus.stderr), address
 
     # ---- The daemon
 

@@ -1,8 +1,6 @@
 """The system's services that the daemon asks, on a message bus of the case's own in the system bus's place."""
 import collections
-import pathlib
 import socket
-import subprocess
 import threading
 
 from jeepney import DBusAddress, HeaderFields, MessageType, message_bus, new_error, new_method_call, new_method_return, new_signal
@@ -13,21 +11,16 @@ GEOCLUE = "org.freedesktop.GeoClue2"
 PLACE = GEOCLUE + ".Location"
 LOGIND = "org.freedesktop.login1"
 CLIENT = DBusAddress("/client", interface=GEOCLUE + ".Client")
-CONFIGURATION = """<busconfig><type>session</type><listen>unix:path={}</listen><policy context="default">
-<allow user="*"/><allow own="*"/><allow send_destination="*" eavesdrop="true"/><allow eavesdrop="true"/></policy></busconfig>"""
 
 
 class SystemBus:
-    """A bus. `calls` counts the calls of everybody on it, by member."""
+    """A bus, which the house's next daemons use. `calls` counts the calls of everybody on it, by member."""
 
-    def __init__(self, directory):
-        path = pathlib.Path(directory, "system-bus")
-        configuration = path.with_suffix(".conf")
-        configuration.write_text(CONFIGURATION.format(path))
-        self.address, self.calls = f"unix:path={path}", collections.Counter()
-        self._daemon = subprocess.Popen(["dbus-daemon", "--nofork", f"--config-file={configuration}", "--print-address"],
-                                        stdout=subprocess.PIPE, stderr=subprocess.DEVNULL)
-        self._daemon.stdout.readline()
+    def __init__(self, house):
+        _, _, self.address = house.start_bus(house.directory("system-bus"), house.environment)
+        self.calls = collections.Counter()
+        house.environment["DBUS_SYSTEM_BUS_ADDRESS"] = self.address
+        house.passed_on += "|DBUS_SYSTEM"
         monitor = open_dbus_connection(self.address)
         monitor.send_and_get_reply(new_method_call(
             DBusAddress("/org/freedesktop/DBus", "org.freedesktop.DBus", "org.freedesktop.DBus.Monitoring"),
@@ -37,10 +30,6 @@ class SystemBus:
     def _count(self, message):
         if message.header.message_type == MessageType.method_call:
             self.calls[message.header.fields[HeaderFields.member]] += 1
-
-    def stop(self):
-        self._daemon.terminate()
-        self._daemon.wait()
 
 
 def follow(connection, handle):

@@ -3,11 +3,9 @@ import configparser
 import pathlib
 import subprocess
 
-from house import CLIENTS, TIMEOUT, check
+from house import CLIENTS, TIMEOUT
 
 PROVIDER = CLIENTS / "search-provider"
-CONFIGURATION = """<busconfig><type>session</type><listen>unix:dir={0}</listen><servicedir>{0}</servicedir><policy context="default">
-<allow send_destination="*" eavesdrop="true"/><allow eavesdrop="true"/><allow own="*"/></policy></busconfig>"""
 
 
 def entries(file):
@@ -23,18 +21,13 @@ class SessionBus:
         """`options` are the provider's."""
         provider = entries("com.quorvane.tavrin.SearchProvider.ini")
         self.name, self.path = provider["BusName"], provider["ObjectPath"]
-        directory = pathlib.Path(house.directory("bus"))
+        directory = house.directory("bus")
         service = (PROVIDER / f"{self.name}.service.in").read_text()
         command = " ".join([str(PROVIDER / "tavrin-search-provider"), *options])
-        (directory / f"{self.name}.service").write_text(service.replace("@TAVRIN_SEARCH_PROVIDER@", command))
-        (directory / "bus.conf").write_text(CONFIGURATION.format(directory))
+        pathlib.Path(directory, f"{self.name}.service").write_text(service.replace("@TAVRIN_SEARCH_PROVIDER@", command))
         self.environment = {**house.environment, "PYTHONPATH": str(PROVIDER.parent / "python")}
-        self._process = subprocess.Popen(["dbus-daemon", "--nofork", f"--config-file={directory}/bus.conf", "--print-address=1"],
-                                         env=self.environment, stdout=subprocess.PIPE, stderr=subprocess.PIPE)
-        house.others.append(self._process)
-        self.reader = house.log.pump(self._process.stderr)  # ends after the bus and the provider have
-        self.address = self._process.stdout.readline().decode().strip()
-        check(self.address, "no session bus")
+        # The reader ends after the bus and the provider have.
+        self._process, self._reader, self.address = house.start_bus(directory, self.environment)
         self.environment["DBUS_SESSION_BUS_ADDRESS"] = self.address
 
     def gdbus(self, member, *arguments):
@@ -47,4 +40,4 @@ class SessionBus:
         """Ends the bus, and with it the provider."""
         self._process.terminate()
         self._process.wait()
-        self.reader.join()
+        self._reader.join()
