@@ -35,11 +35,6 @@ struct DaemonOnDisk final : FeedbackTest {
             ->respond(200, fmt::format("contents of version {}", version));
         device.drain();
     }
-    std::string bagVersion()
-    {
-        const auto bag = assembly().bagController->currentBag();
-        return bag ? bag->version() : "damaged";
-    }
 };
 
 /// What the life of a daemon promised, by numbers of calls of the disk.
@@ -122,8 +117,8 @@ Found restart(platform::FileSystem& files, const fs::path& root)
     DaemonOnDisk daemon(files, root);
     daemon.start();
     Found found;
-    if (const auto text = files.read(root / "caches/com.quorvane.tavrind/bag.plist", 1 << 20); text)
-        found.bag = daemon.bagVersion();
+    const auto bag = daemon.assembly().bagController->currentBag();
+    if (files.info(root / "caches/com.quorvane.tavrind/bag.plist")) found.bag = bag ? bag->version() : "damaged";
     if (const auto text = files.read(root / "caches/com.quorvane.tavrind/TAVQIFeatures", 1 << 20))
         found.resource = std::string(text->view());
     const Value url = daemon.device.userDefaults.value("download_resources")["TAVQIFeatures"]["url"];

@@ -158,37 +158,36 @@ std::string lookAtBooks(Life& life)
     return words + (books.isSettled("upload") ? " settled" : "");
 }
 
-std::string secondsUntilDue(ActivityScheduler& scheduler, Life& life)
+/// The activities of a process, whose lived time goes on from that of the file.
+struct Activities {
+    explicit Activities(Life& life)
+        : use(life.executor), scheduler(makeActivityScheduler(
+                                  {life.clock, life.executor, *life.files, use, life.root / "state/activities.json"}))
+    {
+        scheduler->registerActivity("a", {.repeating = true, .delay = 300s, .interval = 1000s}, [](const auto&) {});
+        life.drain();
+    }
+    test::FakeDeviceUse use;
+    const std::unique_ptr<ActivityScheduler> scheduler;
+};
+
+void useActivities(Life& life)
 {
+    const Activities activities(life);
+    life.steps.front().state = "300"; // after a restart it waits for its delay at least
+    life.step({"1000"}, [&] { life.advance(300s); });
+}
+
+std::string lookAtActivities(Life& life)
+{
+    const Activities activities(life);
     std::string words;
-    scheduler.describe([&](const Value::Array& all) {
+    activities.scheduler->describe([&](const Value::Array& all) {
         for (const Value& activity : all)
             words += fmt::format("{}", std::lround(activity["inSeconds"].asDouble().value_or(0)));
     });
     life.drain();
     return words;
-}
-
-void useActivities(Life& life)
-{
-    test::FakeDeviceUse use(life.executor);
-    const auto scheduler =
-        makeActivityScheduler({life.clock, life.executor, *life.files, use, life.root / "state/activities.json"});
-    scheduler->registerActivity("a", {.repeating = true, .delay = 300s, .interval = 1000s}, [](const auto&) {});
-    life.drain();
-    life.steps.front().state = "300"; // after a restart it waits for its delay at least
-    life.step({"1000"}, [&] { life.advance(300s); });
-}
-
-/// A process whose lived time goes on from that of the file.
-std::string lookAtActivities(Life& life)
-{
-    test::FakeDeviceUse use(life.executor);
-    const auto scheduler =
-        makeActivityScheduler({life.clock, life.executor, *life.files, use, life.root / "state/activities.json"});
-    scheduler->registerActivity("a", {.repeating = true, .delay = 300s, .interval = 1000s}, [](const auto&) {});
-    life.drain();
-    return secondsUntilDue(*scheduler, life);
 }
 
 bool sameBytes(std::span<std::uint8_t> bytes)
@@ -434,16 +433,6 @@ std::string lookAtSessionFile(Life& life)
     return words;
 }
 
-Directories directoriesOf(const Life& life)
-{
-    return {.caches = life.root / "caches",
-            .config = life.root / "config",
-            .state = life.root / "state",
-            .data = life.root / "data",
-            .runtime = life.root / "run",
-            .temporary = life.root / "tmp"};
-}
-
 void useAndRemoveTraces(Life& life)
 {
     life.step({"traces"}, [&] {
@@ -454,7 +443,12 @@ void useAndRemoveTraces(Life& life)
         }
         done(life.files->writeAtomically(life.root / "config/com.quorvane.tavrind.json", "{}"));
     });
-    life.step({"traces", ""}, [&] { EXPECT_TRUE(tavrin::removeTraces(directoriesOf(life), true).empty()); });
+    const Directories directories{.caches = life.root / "caches",
+                                  .config = life.root / "config",
+                                  .state = life.root / "state",
+                                  .data = life.root / "data",
+                                  .temporary = life.root / "tmp"};
+    life.step({"traces", ""}, [&] { EXPECT_TRUE(tavrin::removeTraces(directories, true).empty()); });
 }
 
 std::string lookAtTraces(Life& life)
