@@ -26,18 +26,13 @@ void runInput(std::string_view input)
 
     const auto message = test::newBusMessage();
     const auto written = ipc::encodeArguments(message.get(), "a{sv}", {.args = {value}, .handles = {}});
-    if (!written) {
-        check(!written.error().empty() && fuzz::depthOf(value) > kSafeDepth, written.error());
-        return;
-    }
+    if (!written) return check(!written.error().empty() && fuzz::depthOf(value) > kSafeDepth, written.error());
     check(sd_bus_message_seal(message.get(), 1, 0) >= 0);
-    const auto read = ipc::decodeArguments(message.get(), SIZE_MAX);
+    const auto read = test::decodedFromStart(message, SIZE_MAX, {});
     check(read.has_value(), read ? "" : read.error().message);
     check(read->message.args.size() == 1 && read->message.args[0] == fuzz::arriving(value), toJson(value));
 
-    sd_bus_message_rewind(message.get(), true);
-    check(ipc::decodeArguments(message.get(), read->size).has_value());
-    sd_bus_message_rewind(message.get(), true);
-    const auto refused = ipc::decodeArguments(message.get(), read->size - 1);
+    check(test::decodedFromStart(message, read->size, {}).has_value());
+    const auto refused = test::decodedFromStart(message, read->size - 1, {});
     check(!refused && refused.error().name == SD_BUS_ERROR_LIMITS_EXCEEDED, refused ? "" : refused.error().name);
 }

@@ -45,10 +45,7 @@ void judge(HttpHeaders headers)
     const auto fields = selectingFields(stored.response, request);
     const auto lifetime = freshnessLifetime(stored.response, kNow);
     check(lifetime.count() >= 0 && currentAge(stored, kNow).count() >= 0);
-    if (!fields) {
-        check(!isStorable(request, stored.response, kNow));
-        return;
-    }
+    if (!fields) return check(!isStorable(request, stored.response, kNow));
     stored.selecting = *fields;
     const bool answered = reuse(stored, request, kNow) == Reuse::Answer;
     check(!answered || lifetime > currentAge(stored, kNow));

@@ -22,10 +22,7 @@ bool sameJson(const Value& a, const Value& b)
 void runInput(std::string_view input)
 {
     const auto value = parseJson(input);
-    if (!value) {
-        check(value.error().code == kFormatMalformed && !value.error().reason().empty());
-        return;
-    }
+    if (!value) return check(value.error().code == kFormatMalformed && !value.error().reason().empty());
     const std::string text = toJson(*value);
     check(jsonSize(*value) == text.size(), text);
     for (const std::string& written : {text, toJson(*value, JsonStyle::Pretty)}) {

@@ -35,15 +35,9 @@ bool mayBeRefused(const Value& value)
 void runInput(std::string_view input)
 {
     const auto value = parsePropertyList(input);
-    if (!value) {
-        check(value.error().code == kFormatMalformed && !value.error().reason().empty());
-        return;
-    }
+    if (!value) return check(value.error().code == kFormatMalformed && !value.error().reason().empty());
     const auto written = toPropertyList(*value);
-    if (!written) {
-        check(fuzz::anyOf(*value, mayBeRefused), written.error().reason());
-        return;
-    }
+    if (!written) return check(fuzz::anyOf(*value, mayBeRefused), written.error().reason());
     const auto again = parsePropertyList(*written);
     check(again.has_value(), again ? "" : again.error().reason());
     check(test::equalBy(*value, *again, sameOnceWritten), toJson(*value) + " became " + toJson(*again));
