@@ -202,11 +202,6 @@ class House:
     def all_sent(self):
         self.soon(lambda: self.books()["uploading"] == 0, "uploads go on and on")
 
-    def picture(self, name, size):
-        """The size of a picture that comes within ten seconds, else 0."""
-        return self.json("images", "--url", f"{self.https}/images/{name}?size={size}", "--within", "10", "-o",
-                         self.directory("pictures")).get("bytes", 0)
-
     def books(self):
         """The feedback counters. Every recorded event is in one place, or was dropped for a reason."""
         books = self.json("status")["feedback"]
