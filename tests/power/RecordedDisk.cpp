@@ -14,6 +14,8 @@
 #include <sys/uio.h>
 #include <unistd.h>
 
+#include <fmt/format.h>
+
 namespace platform::test {
 
 namespace fs = std::filesystem;
@@ -155,18 +157,13 @@ std::string RecordedDisk::describe(std::size_t call) const
 {
     if (call >= _calls.size()) return "the end";
     const Call& made = _calls[call];
-    const auto pathOf = [this](const Place& place) { return _nodes.at(place.directory) + "/" + place.name; };
-    switch (made.kind) {
-    case Call::Kind::Entries:
-        return (made.removed ? "remove " + pathOf(*made.removed) + " " : "") +
+    const auto pathOf = [this](const Place& place) { return _nodes.at(place.directory) + "/" + place.name + " "; };
+    if (made.kind == Call::Kind::Entries)
+        return (made.removed ? "remove " + pathOf(*made.removed) : "") +
                (made.added ? "add " + pathOf(*made.added) : "");
-    case Call::Kind::Write:
-        return "write " + std::to_string(made.data.size()) + " bytes at " + std::to_string(made.offset) + " of " +
-               _nodes.at(made.node);
-    case Call::Kind::Truncate: return "truncate " + _nodes.at(made.node) + " to " + std::to_string(made.offset);
-    case Call::Kind::Sync: return "sync " + _nodes.at(made.node);
-    }
-    return "";
+    constexpr const char* kNames[]{"", "write", "truncate", "sync"};
+    return fmt::format("{} {}, offset {}, {} bytes", kNames[static_cast<int>(made.kind)], _nodes.at(made.node),
+                       made.offset, made.data.size());
 }
 
 std::string RecordedDisk::contentsOf(Node node, std::size_t calls, Dice& dice) const

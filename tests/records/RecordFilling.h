@@ -111,23 +111,4 @@ inline std::map<std::string, Value> fill(platform::Record& record, const platfor
     return given;
 }
 
-/// A record of whatever class and fields a dictionary names, for archives that no record of ours would write.
-class LooseRecord final : public platform::Record {
-public:
-    explicit LooseRecord(const Value& dictionary) : _dictionary(*dictionary.asDictionary()) {}
-    [[nodiscard]] std::string_view className() const override { return *_dictionary.find("class")->asString(); }
-    [[nodiscard]] std::size_t fieldCount() const override { return _dictionary.size() - 1; }
-    void encodeFields(platform::Encoder& encoder) const override
-    {
-        for (const auto& [name, value] : _dictionary) {
-            if (name == "class") continue;
-            encoder.key(name);
-            encoder.value(value);
-        }
-    }
-
-private:
-    const Dictionary _dictionary;
-};
-
 } // namespace tavrin
