@@ -51,6 +51,17 @@ def whole_records(path):
     return records
 
 
+def start_bus(directory, **options):
+    """Starts a message bus, which starts the programs of the directory. Returns its process and its address."""
+    configuration = pathlib.Path(directory, "bus.conf")
+    configuration.write_text(BUS.format(directory))
+    bus = subprocess.Popen(["dbus-daemon", "--nofork", f"--config-file={configuration}", "--print-address=1"],
+                           stdout=subprocess.PIPE, **options)
+    address = bus.stdout.readline().decode().strip()
+    check(address, "no message bus")
+    return bus, address
+
+
 class Log:
     """The lines that the programs write, as they come. Any thread."""
 
@@ -107,18 +118,6 @@ class House:
     def directory(self, name):
         (self.home / name).mkdir(mode=0o700, exist_ok=True)
         return str(self.home / name)
-
-    def start_bus(self, directory, environment):
-        """Starts a message bus, which starts the programs of the directory. Returns its process, the thread that reads its log, and
-        its address."""
-        configuration = pathlib.Path(directory, "bus.conf")
-        configuration.write_text(BUS.format(directory))
-        bus = subprocess.Popen(["dbus-daemon", "--nofork", f"--config-file={configuration}", "--print-address=1"], env=environment,
-                               stdout=subprocess.PIPE, stderr=subprocess.PIPE)
-        self.others.append(bus)
-        address = bus.stdout.readline().decode().strip()
-        check(address, "no message bus")
-        return bus, self.log.pump(bus.stderr), address
 
     # ---- The daemon
 

@@ -1,10 +1,13 @@
 """The system's services that the daemon asks, on a message bus of the case's own in the system bus's place."""
 import collections
 import socket
+import subprocess
 import threading
 
 from jeepney import DBusAddress, HeaderFields, MessageType, message_bus, new_error, new_method_call, new_method_return, new_signal
 from jeepney.io.blocking import open_dbus_connection
+
+from house import start_bus
 
 NETWORK = "org.freedesktop.NetworkManager"
 GEOCLUE = "org.freedesktop.GeoClue2"
@@ -14,13 +17,11 @@ CLIENT = DBusAddress("/client", interface=GEOCLUE + ".Client")
 
 
 class SystemBus:
-    """A bus, which the house's next daemons use. `calls` counts the calls of everybody on it, by member."""
+    """A bus. `calls` counts the calls of everybody on it, by member."""
 
-    def __init__(self, house):
-        _, _, self.address = house.start_bus(house.directory("system-bus"), house.environment)
+    def __init__(self, directory):
+        self.process, self.address = start_bus(directory, stderr=subprocess.DEVNULL)
         self.calls = collections.Counter()
-        house.environment["DBUS_SYSTEM_BUS_ADDRESS"] = self.address
-        house.passed_on += "|DBUS_SYSTEM"
         monitor = open_dbus_connection(self.address)
         monitor.send_and_get_reply(new_method_call(
             DBusAddress("/org/freedesktop/DBus", "org.freedesktop.DBus", "org.freedesktop.DBus.Monitoring"),
@@ -30,6 +31,19 @@ class SystemBus:
     def _count(self, message):
         if message.header.message_type == MessageType.method_call:
             self.calls[message.header.fields[HeaderFields.member]] += 1
+
+    def stop(self):
+        self.process.terminate()
+        self.process.wait()
+
+
+def system_bus(house):
+    """A bus for the house's daemon, which ends with the house."""
+    bus = SystemBus(house.directory("system-bus"))
+    house.others.append(bus.process)
+    house.environment["DBUS_SYSTEM_BUS_ADDRESS"] = bus.address
+    house.passed_on += "|DBUS_SYSTEM"
+    return bus
 
 
 def follow(connection, handle):

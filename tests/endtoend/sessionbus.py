@@ -3,7 +3,7 @@ import configparser
 import pathlib
 import subprocess
 
-from house import CLIENTS, TIMEOUT
+from house import CLIENTS, TIMEOUT, start_bus
 
 PROVIDER = CLIENTS / "search-provider"
 
@@ -26,8 +26,9 @@ class SessionBus:
         command = " ".join([str(PROVIDER / "tavrin-search-provider"), *options])
         pathlib.Path(directory, f"{self.name}.service").write_text(service.replace("@TAVRIN_SEARCH_PROVIDER@", command))
         self.environment = {**house.environment, "PYTHONPATH": str(PROVIDER.parent / "python")}
-        # The reader ends after the bus and the provider have.
-        self._process, self._reader, self.address = house.start_bus(directory, self.environment)
+        self._process, self.address = start_bus(directory, env=self.environment, stderr=subprocess.PIPE)
+        house.others.append(self._process)
+        self._reader = house.log.pump(self._process.stderr)  # ends after the bus and the provider have
         self.environment["DBUS_SESSION_BUS_ADDRESS"] = self.address
 
     def gdbus(self, member, *arguments):
