@@ -92,10 +92,8 @@ TEST(Uploads, CountsWhatDevicesCountAsSentAndOnce)
                              R"({"type":"session_missing_results","timestamp":0},)"
                              R"({"type":"session_missing_suggestions","timestamp":0}],"agent":"A/1","user_guid":"G"})";
     Uploads uploads;
-    for (const auto& [status, cut] : {std::pair(503, false), {200, true}, {200, false}}) {
-        Upload upload = checkUpload(uploadOf("/feedback", text, sha512(text)));
-        uploads.add(std::move(upload), Answer{.status = status, .cut = cut});
-    }
+    for (const auto& [status, cut] : {std::pair(503, false), {200, true}, {200, false}})
+        uploads.add(checkUpload(uploadOf("/feedback", text, sha512(text))), Answer{.status = status, .cut = cut});
     EXPECT_EQ(platform::toJson(uploads.totals()),
               R"({"received":3,"taken":2,"refused":1,"repeats":2,"events":3,"recorded":1})");
 }
