@@ -4,44 +4,13 @@
 
 #include <gtest/gtest.h>
 
-#include "platform/values/Dictionary.h"
-#include "platform/values/Json.h"
 #include "platform/values/Record.h"
 #include "platform/values/ValueCoder.h"
+#include "tests/support/BusMessages.h"
 
 namespace platform::test {
 
 namespace {
-
-std::string_view nextType(std::string_view signature)
-{
-    if (signature.starts_with("a{sv}")) return signature.substr(0, 5);
-    std::size_t length = 1;
-    if (signature.starts_with('a')) length += nextType(signature.substr(1)).size();
-    return signature.substr(0, length);
-}
-
-bool fits(std::string_view type, const Value& value, std::size_t handleCount)
-{
-    if (type == "a{sv}") return value.asDictionary() != nullptr;
-    if (type == "ay") return value.asBytes() != nullptr;
-    if (type.starts_with('a')) {
-        const auto* array = value.asArray();
-        return array && std::ranges::all_of(
-                            *array, [&](const Value& element) { return fits(type.substr(1), element, handleCount); });
-    }
-    switch (type[0]) {
-    case 's': return value.asString() != nullptr;
-    case 'x':
-    case 'i': return value.asInt().has_value();
-    case 't':
-    case 'u': return value.asUInt().has_value();
-    case 'd': return value.asDouble().has_value();
-    case 'b': return value.asBool().has_value();
-    case 'h': return value.asUInt().value_or(handleCount) < handleCount;
-    default: return false;
-    }
-}
 
 const ipc::Member* find(const std::vector<ipc::Member>& members, std::string_view name)
 {
@@ -61,15 +30,8 @@ ipc::Message withoutRecords(ipc::Message message)
 /// Expects that `message` can travel under the D-Bus signature.
 void expectShape(std::string_view what, std::string_view signature, const ipc::Message& message)
 {
-    std::size_t index = 0;
-    for (; !signature.empty(); ++index) {
-        const auto type = nextType(signature);
-        signature.remove_prefix(type.size());
-        ASSERT_LT(index, message.args.size()) << what << ": too few arguments";
-        EXPECT_TRUE(fits(type, message.args[index], message.handles.size()))
-            << what << ": argument " << index << " is not " << type << ": " << toJson(message.args[index]);
-    }
-    EXPECT_EQ(index, message.args.size()) << what << ": too many arguments";
+    const auto written = ipc::encodeArguments(newBusMessage().get(), signature, message);
+    EXPECT_TRUE(written) << what << ": " << written.error();
 }
 
 } // namespace
@@ -83,12 +45,6 @@ ipc::CallResult FakeCall::take()
 {
     if (!_result) return std::unexpected(ipc::CallError{.name = "test.NoAnswer", .message = "there is no answer"});
     return *std::exchange(_result, std::nullopt);
-}
-
-void FakeCall::settle(State state, std::optional<ipc::CallResult> result)
-{
-    _state = state;
-    _result = std::move(result);
 }
 
 FakeConnection::FakeConnection(const ipc::Interface& interface, ipc::Peer peer, std::shared_ptr<Queue> queue)
@@ -112,20 +68,20 @@ std::shared_ptr<FakeCall> FakeConnection::call(std::string_view member, ipc::Mes
     expectShape(member, found->in, arguments);
 
     if (!_resumed || _invalidated) {
-        call->settle(FakeCall::State::Abandoned, std::nullopt);
+        call->_state = FakeCall::State::Abandoned;
         return call;
     }
     _queue->async([dropped = _dropCalls, handler = _handler, name = found->name, out = found->out, call,
                    arguments = std::move(arguments)]() mutable {
-        if (*dropped) return call->settle(FakeCall::State::Abandoned, std::nullopt);
         ipc::Responder reply(
             [call, name, out](ipc::CallResult result) {
                 if (result) result = withoutRecords(std::move(*result));
                 if (result) expectShape(name, out, *result);
-                call->settle(FakeCall::State::Answered, std::move(result));
+                call->_state = FakeCall::State::Answered;
+                call->_result = std::move(result);
             },
-            [call] { call->settle(FakeCall::State::Abandoned, std::nullopt); });
-        if (handler && *handler)
+            [call] { call->_state = FakeCall::State::Abandoned; });
+        if (!*dropped && handler && *handler)
             (*handler)(name, std::move(arguments), std::move(reply));
         else
             reply.abandon();

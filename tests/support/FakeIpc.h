@@ -16,8 +16,6 @@ namespace platform::test {
 /// What became of a call that a test made.
 class FakeCall {
 public:
-    enum class State { Pending, Answered, Abandoned };
-    [[nodiscard]] State state() const { return _state; }
     [[nodiscard]] bool pending() const { return _state == State::Pending; }
     [[nodiscard]] bool answered() const { return _state == State::Answered; }
     [[nodiscard]] bool abandoned() const { return _state == State::Abandoned; }
@@ -28,7 +26,7 @@ public:
 
 private:
     friend class FakeConnection;
-    void settle(State state, std::optional<ipc::CallResult> result);
+    enum class State { Pending, Answered, Abandoned };
     State _state = State::Pending;
     std::optional<ipc::CallResult> _result;
 };

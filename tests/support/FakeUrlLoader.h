@@ -61,7 +61,6 @@ public:
         std::shared_ptr<HttpCache> _cache;
     };
 
-    FakeUrlLoader() = default;
     /// Breaks the rings of tasks that nobody answered, or whose end nobody ran.
     ~FakeUrlLoader() override;
 
