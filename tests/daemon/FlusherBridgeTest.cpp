@@ -6,10 +6,9 @@
 namespace tavrin::test {
 namespace {
 
-using Types = std::vector<std::string>;
-using platform::test::LogCapture;
-
 struct BridgeTest : FeedbackTest {
+    BridgeTest() { begin(); }
+
     std::shared_ptr<FakeConnection> tool()
     {
         const auto call = connection->call("ListenToFlusher");
@@ -23,9 +22,9 @@ struct BridgeTest : FeedbackTest {
         tool.call("InitiateConnectionWithIntent", {Value(number)});
         device.drain();
     }
-    static Types signals(FakeConnection& tool)
+    static Strings signals(FakeConnection& tool)
     {
-        Types names;
+        Strings names;
         for (const auto& push : tool.takePushes()) names.push_back(push.signal);
         return names;
     }
@@ -33,7 +32,6 @@ struct BridgeTest : FeedbackTest {
 
 TEST_F(BridgeTest, EventsAreShownLive)
 {
-    begin();
     const auto watcher = tool();
     appear();
     EXPECT_TRUE(watcher->takePushes().empty()) << "before it asked";
@@ -48,18 +46,17 @@ TEST_F(BridgeTest, EventsAreShownLive)
                   {"input", "example.org"}, {"query_id", 4}, {"type", "did_go_to_site"}, {"timestamp", 7654}})));
     flushSession();
     (void)watcher->takePushes();
-    device.files.fault = [](std::string_view operation, const auto&) { return operation == "create" ? ENOSPC : 0; };
+    failOn("create", ENOSPC);
     appear();
     EXPECT_EQ(booked(FeedbackFate::NoContainer), 1);
-    EXPECT_EQ(signals(*watcher), Types{"ReceivedFeedbackDescription"}) << "in no file, but shown";
+    EXPECT_EQ(signals(*watcher), Strings{"ReceivedFeedbackDescription"}) << "in no file, but shown";
 }
 
 TEST_F(BridgeTest, DumpEndsSessionsAndShowsTheBodies)
 {
-    begin();
     const auto dumper = tool();
     intent(*dumper, 2);
-    EXPECT_EQ(signals(*dumper), Types{"WorkDone"});
+    EXPECT_EQ(signals(*dumper), Strings{"WorkDone"});
     EXPECT_TRUE(assembly().backgroundFlusher->stopFlushing());
     appear();
     intent(*dumper, 3);
@@ -68,45 +65,42 @@ TEST_F(BridgeTest, DumpEndsSessionsAndShowsTheBodies)
     EXPECT_EQ(pushes[0].signal, "FlushedData");
     EXPECT_EQ(pushes[1].signal, "WorkDone");
     const auto body = tools::inflateRaw(pushes[0].message.args[0].asBytes()->view(), 1u << 20);
-    EXPECT_EQ(typesIn(platform::parseJson(*body).value()), (Types{"search_view_appear", "session_end"}));
+    EXPECT_EQ(typesIn(platform::parseJson(*body).value()), (Strings{"search_view_appear", "session_end"}));
     EXPECT_EQ(uploads().size(), 1u) << "it is uploaded, too";
     EXPECT_FALSE(assembly().backgroundFlusher->stopFlushing());
 
     intent(*dumper, 3);
-    EXPECT_EQ(signals(*dumper), Types{"WorkDone"}) << "nothing left";
+    EXPECT_EQ(signals(*dumper), Strings{"WorkDone"}) << "nothing left";
 }
 
 TEST_F(BridgeTest, AToolThatLeavesLosesEveryRoleThatItHeld)
 {
-    begin();
-    const Types all{"receiving stream", "sending stream", "remote"};
-    struct Case {
+    const Strings all{"receiving stream", "sending stream", "remote"};
+    const struct {
         std::vector<std::uint64_t> intents;
-        Types removed;
+        Strings removed;
         bool othersFollow = false; // the last to connect is the remote one
-    };
-    for (const Case& each : {Case{{}, {"remote"}},
-                             {{0}, {"sending stream", "remote"}},
-                             {{1}, {"receiving stream", "remote"}},
-                             {{3}, {"sending stream", "remote"}},
-                             {{1, 0}, all},
-                             {{7}, {}, true}}) { // no such command
+    } cases[]{{{}, {"remote"}},
+              {{0}, {"sending stream", "remote"}},
+              {{1}, {"receiving stream", "remote"}},
+              {{3}, {"sending stream", "remote"}},
+              {{1, 0}, all},
+              {{7}, {}, true}}; // no such command
+    for (const auto& each : cases) {
         const auto leaving = tool();
         const auto later = each.othersFollow ? tool() : nullptr;
         for (const std::uint64_t number : each.intents) intent(*leaving, number);
         EXPECT_EQ(leaving->takePushes().empty(), !std::ranges::count(each.intents, 3u));
-        LogCapture log;
-        leaving->end();
-        device.drain();
+        LogCapture removals;
+        end(*leaving);
         for (const std::string& role : all)
-            EXPECT_EQ(log.count("Removed " + role + " listener"), std::ranges::count(each.removed, role)) << role;
+            EXPECT_EQ(removals.count("Removed " + role + " listener"), std::ranges::count(each.removed, role)) << role;
         if (later) later->end();
     }
 }
 
 TEST_F(BridgeTest, BodiesAreShownEvenIfTheBagNamesNoEndpoint)
 {
-    begin();
     fetchBag(R"({"version": "1001", "searchURL": "https://s.example/search"})");
     const auto dumper = tool();
     intent(*dumper, 2);
@@ -119,21 +113,20 @@ TEST_F(BridgeTest, BodiesAreShownEvenIfTheBagNamesNoEndpoint)
 
 TEST_F(BridgeTest, EachToolGetsWhatItAskedFor)
 {
-    begin();
     const auto bodies = tool();
     const auto events = tool();
     intent(*bodies, 0); // the other one connected last
     intent(*events, 1);
     appear();
-    EXPECT_EQ(signals(*events), Types{"ReceivedFeedbackDescription"});
+    EXPECT_EQ(signals(*events), Strings{"ReceivedFeedbackDescription"});
     intent(*events, 3);
-    EXPECT_EQ(signals(*events), (Types{"ReceivedFeedbackDescription", "WorkDone"})) << "the session's end, and its own";
-    EXPECT_EQ(signals(*bodies), Types{"FlushedData"});
+    EXPECT_EQ(signals(*events), (Strings{"ReceivedFeedbackDescription", "WorkDone"}))
+        << "the session's end, and its own";
+    EXPECT_EQ(signals(*bodies), Strings{"FlushedData"});
 }
 
 TEST_F(BridgeTest, APreviewIsWhatLeavesByteForByte)
 {
-    begin();
     appear();
     report("ZRCustomFeedback", {{"feedbackType", 2}, {"jsonFeedback", Dictionary{{"domain", "example.org"}}}});
     const auto preview = [this] {
@@ -167,7 +160,6 @@ TEST_F(BridgeTest, APreviewIsWhatLeavesByteForByte)
 
 TEST_F(BridgeTest, AToolThatIsReplacedIsTold)
 {
-    begin();
     const auto first = tool();
     const auto second = tool();
     intent(*first, 1);
@@ -181,8 +173,7 @@ TEST_F(BridgeTest, AToolThatIsReplacedIsTold)
     EXPECT_EQ(pushes[0].message.args, (std::vector<Value>{Value(1u), Value(second->peer().pid)}));
     const Value pid(second->peer().pid);
     EXPECT_EQ(assembly().flusherXPCListener->watchers(), Value(Dictionary{{"events", pid}, {"flushes", pid}}));
-    second->end();
-    device.drain();
+    end(*second);
     EXPECT_EQ(assembly().flusherXPCListener->watchers(), Value(Dictionary()));
 }
 

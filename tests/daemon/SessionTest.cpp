@@ -8,10 +8,9 @@
 namespace tavrin::test {
 namespace {
 
-using namespace std::chrono_literals;
-using Types = std::vector<std::string>;
-
 struct SessionTest : FeedbackTest {
+    SessionTest() { begin(); }
+
     SessionState state() { return manager()->currentState(); }
     /// Ends what is open, uploads everything, and returns the clients' sessions, first to last; a fetch of a stale bag
     /// is a session of the daemon's own.
@@ -34,15 +33,14 @@ struct SessionTest : FeedbackTest {
 
 TEST_F(SessionTest, SessionsEndAtTheirLimits)
 {
-    begin();
     struct Case {
         const char* what;
         std::function<void()> happens; ///< after one event
         const char* endReason;
-        Types events;
+        Strings events;
         bool rolls = true; ///< another GUID follows
     };
-    const auto events = [](Types types) {
+    const auto events = [](Strings types) {
         types.insert(types.begin(), "search_view_appear");
         types.emplace_back("session_end");
         return types;
@@ -57,7 +55,7 @@ TEST_F(SessionTest, SessionsEndAtTheirLimits)
                  report("ZRClearInputFeedback");
              }
          },
-         "max session time passed", events(Types(7, "clear_input"))},
+         "max session time passed", events(Strings(7, "clear_input"))},
         {"an engagement behind 10 minutes",
          [this] {
              device.advance(601s);
@@ -136,15 +134,14 @@ TEST_F(SessionTest, ClientsShareAGuidButNoSession)
         const std::int64_t before = counter("Vistrel/4.sessions");
         appear();
         auto other = client("com.quorvane.wendral", "Wendral/7", 78);
-        other->call("ReportEvent", {"event", std::int64_t{3}, Dictionary{{"class", "ZRClearInputFeedback"}}});
-        device.drain();
+        report(*other, "ZRClearInputFeedback");
         if (!shared) connection->end();
         if (!shared) other->end();
         const auto all = sessions();
         ASSERT_EQ(all.size(), 2u);
         EXPECT_EQ(all[0]["agent"], Value("Vistrel/4"));
         EXPECT_EQ(all[1]["agent"], Value("Wendral/7"));
-        EXPECT_EQ(typesIn(all[1]), (Types{"clear_input", "session_end"}));
+        EXPECT_EQ(typesIn(all[1]), (Strings{"clear_input", "session_end"}));
         EXPECT_NE(all[0]["user_guid"], Value(""));
         EXPECT_EQ(all[0]["user_guid"] == all[1]["user_guid"], shared);
         EXPECT_EQ(counter("Vistrel/4.sessions") - before, 1);
@@ -153,7 +150,6 @@ TEST_F(SessionTest, ClientsShareAGuidButNoSession)
 
 TEST_F(SessionTest, TimersOfAnEarlierSessionDoNothing)
 {
-    begin();
     appear();
     device.advance(500s);
     flushSession();
@@ -164,16 +160,14 @@ TEST_F(SessionTest, TimersOfAnEarlierSessionDoNothing)
     EXPECT_EQ(state(), SessionState::SoftLimit); // five minutes are left
     flushSession();
     appear();
-    platform::test::LogCapture log;
+    LogCapture late;
     device.advance(300s);
-    EXPECT_EQ(log.count("max timer expired expected"), 1);
+    EXPECT_EQ(late.count("max timer expired expected"), 1);
     EXPECT_EQ(state(), SessionState::Open);
 }
 
 TEST_F(SessionTest, EventsFromOutsideByNumber)
 {
-    begin();
-    platform::test::LogCapture log;
     const auto post = [this](unsigned number) {
         manager()->externalEvent(static_cast<SessionEvent>(number));
         device.drain();
@@ -195,28 +189,23 @@ TEST_F(SessionTest, EventsFromOutsideByNumber)
 
 TEST_F(SessionTest, EndOfAConnection)
 {
-    platform::test::LogCapture log;
-    begin(true);
     appear();
-    connection->end();
-    device.drain();
+    end(*connection);
     EXPECT_EQ(state(), SessionState::Open) << "a shared session goes on";
     EXPECT_TRUE(log.has(platform::LogLevel::Debug, "Tavrin_Session", "session not flushed on invalidation"));
-    EXPECT_EQ(typesIn(sessions().at(0)), (Types{"search_view_appear", "connection_invalidated", "session_end"}));
+    EXPECT_EQ(typesIn(sessions().at(0)), (Strings{"search_view_appear", "connection_invalidated", "session_end"}));
 
     begin(false);
     appear();
     EXPECT_EQ(manager()->session(), nullptr) << "the client's own manager has it";
-    connection->end();
-    device.drain();
+    end(*connection);
     EXPECT_TRUE(log.has(platform::LogLevel::Debug, "Tavrin_Session", "session flushed on invalidation"));
     upload();
-    EXPECT_EQ(typesIn(decoded(*uploads().at(0))), (Types{"search_view_appear", "session_end"}));
+    EXPECT_EQ(typesIn(decoded(*uploads().at(0))), (Strings{"search_view_appear", "session_end"}));
 }
 
 TEST_F(SessionTest, BagSwitchesFeedbackOffByUserAgent)
 {
-    begin();
     connection = client("com.quorvane.news", "News/1", 79);
     appear();
     EXPECT_TRUE(sessionFiles().empty());
@@ -236,12 +225,11 @@ TEST_F(SessionTest, WithoutABagFeedbackIsKept)
 
 TEST_F(SessionTest, FirstUseOfTheDayByTheLocalCalendar)
 {
-    begin(); // 2026-01-01 01:00 in Zurich
     const auto firstUse = [this] {
         appear();
         return sessions().back()["first_use"];
     };
-    EXPECT_EQ(firstUse(), Value(true));
+    EXPECT_EQ(firstUse(), Value(true)) << "2026-01-01 01:00 in Zurich";
     EXPECT_EQ(firstUse(), Value(false));
     device.advance(22h + 58min);
     EXPECT_EQ(firstUse(), Value(false)) << "still the first of January there";
@@ -265,7 +253,6 @@ TEST(FirstUse, ClientsByTheirAgent)
 
 TEST_F(SessionTest, OneOffSessions)
 {
-    begin();
     const Dictionary json{{"features", Value::Array{1, 2}}};
     report("ZRCustomFeedback", {{"feedbackType", 3}, {"jsonFeedback", json}});
     report("ZRCustomFeedback", {{"feedbackType", 1}, {"jsonFeedback", json}});
@@ -278,18 +265,16 @@ TEST_F(SessionTest, OneOffSessions)
     EXPECT_EQ(features["fb"][0]["query_id"], Value());
     EXPECT_EQ(features["user_guid"], Value(""));
     EXPECT_EQ(features["agent"], Value("Vistrel/4"));
-    EXPECT_EQ(typesIn(features), Types{"custom_vistrel_result_features"});
-    EXPECT_EQ(typesIn(decoded(*uploads()[1])), Types{"custom_wendral_autofill"});
+    EXPECT_EQ(typesIn(features), Strings{"custom_vistrel_result_features"});
+    EXPECT_EQ(typesIn(decoded(*uploads()[1])), Strings{"custom_wendral_autofill"});
     EXPECT_GT(decoded(*uploads()[1])["base_time"].asInt().value_or(0), 0);
 
     auto stranger = connect(99); // has not configured
-    for (int i = 0; i < 3; ++i)
-        stranger->call("ReportEvent", {"event", std::int64_t{1}, Dictionary{{"class", "ZRClearInputFeedback"}}});
-    device.drain();
+    for (int i = 0; i < 3; ++i) report(*stranger, "ZRClearInputFeedback");
     EXPECT_EQ(sessionFiles().size(), 1u) << "one error for a connection";
     upload();
     const Value error = decoded(*uploads().at(2));
-    EXPECT_EQ(typesIn(error), Types{"error"});
+    EXPECT_EQ(typesIn(error), Strings{"error"});
     EXPECT_EQ(error["agent"], Value(ClientSessionManager::tavrindUserAgent()));
     EXPECT_EQ(error["fb"][0]["error"]["reason"], Value("client state nil"));
     expectBooksClose();
@@ -297,7 +282,6 @@ TEST_F(SessionTest, OneOffSessions)
 
 TEST_F(SessionTest, AForeignGuidIsReportedInTheSession)
 {
-    begin();
     ClientSession session(assembly(), std::make_shared<TavrinFeedback>(std::make_shared<ZRClearInputFeedback>(), 1,
                                                                        platform::Uuid::random().string(), "A/1"));
     session.addFeedback(std::make_shared<TavrinFeedback>(std::make_shared<ZRClearInputFeedback>(), 2,
@@ -315,7 +299,6 @@ TEST_F(SessionTest, AForeignGuidIsReportedInTheSession)
 
 TEST_F(SessionTest, SharedSessionsAreBounded)
 {
-    begin();
     const auto of = [](int agent) {
         return std::make_shared<TavrinFeedback>(std::make_shared<ZRFeedback>(), 0, "", std::to_string(agent));
     };
@@ -349,15 +332,11 @@ TEST_F(SessionTest, FeedbackInMemoryIsAnsweredWithTimesSinceTheFirst)
 
 TEST_F(SessionTest, SharedFeedbackInMemoryIsOneAgentsBehindAnothers)
 {
-    begin();
     assembly().testFeedbacks = true;
-    const auto first = connection;
     const auto second = client("com.quorvane.wendral", "Wendral/7", 78);
-    for (const auto& [from, timestamp] : {std::pair(second, 5'000'000), {first, 6'000'000}, {second, 8'000'000}}) {
-        connection = from;
-        report("ZRClearInputFeedback", {{"timestamp", timestamp}});
-    }
-    const auto call = first->call("Feedback", {""});
+    for (const auto& [from, timestamp] : {std::pair(second, 5'000'000), {connection, 6'000'000}, {second, 8'000'000}})
+        report(*from, "ZRClearInputFeedback", {{"timestamp", timestamp}});
+    const auto call = connection->call("Feedback", {""});
     device.drain();
     Value::Array times;
     for (std::size_t i = 0; i < call->argument(0).count(); ++i) times.push_back(call->argument(0)[i]["timestamp"]);

@@ -1,5 +1,7 @@
 #include "tests/support/DaemonFixture.h"
 
+#include "tavrind/TavrinBagController.h"
+
 namespace tavrin::test {
 
 RecordingSessionManager::RecordingSessionManager(Assembly& assembly)
@@ -11,9 +13,9 @@ void RecordingSessionManager::addTavrinFeedback(std::shared_ptr<TavrinFeedback> 
     records.push_back(std::move(feedback));
 }
 
-std::vector<std::string> RecordingSessionManager::takeClasses()
+Strings RecordingSessionManager::takeClasses()
 {
-    std::vector<std::string> classes;
+    Strings classes;
     for (const auto& record : std::exchange(records, {})) classes.emplace_back(record->feedback()->className());
     return classes;
 }
@@ -66,6 +68,13 @@ void DaemonTest::respond(std::string body, int status, platform::HttpHeaders hea
     device.drain();
 }
 
+void DaemonTest::expireBag()
+{
+    device.clock.setWall(device.clock.wallNow() + 14400s);
+    (void)assembly().bagController->currentBag();
+    device.drain();
+}
+
 std::shared_ptr<FakeConnection> DaemonTest::connect(pid_t pid)
 {
     auto connection = device.ipc.connect("com.quorvane.TAVDaemonXPC", {.pid = pid, .uid = 0});
@@ -85,6 +94,21 @@ std::shared_ptr<FakeCall> DaemonTest::configure(FakeConnection& connection, std:
     auto call = connection.call("Configure", {Value::dictionaryOf({{"class", "TAVSessionConfiguration"},
                                                                    {"identifier", std::move(identifier)},
                                                                    {"userAgent", std::move(agent)}})});
+    device.drain();
+    return call;
+}
+
+void DaemonTest::end(FakeConnection& connection)
+{
+    connection.end();
+    device.drain();
+}
+
+std::shared_ptr<FakeCall> DaemonTest::report(FakeConnection& connection, std::string className, Dictionary fields,
+                                             std::int64_t queryId)
+{
+    fields.set("class", std::move(className));
+    auto call = connection.call("ReportEvent", {"event", queryId, std::move(fields)});
     device.drain();
     return call;
 }
@@ -111,6 +135,13 @@ std::shared_ptr<FakeCall> DaemonTest::search(FakeConnection& connection, std::in
 std::int64_t DaemonTest::counter(std::string_view name)
 {
     return device.counters.value("com.quorvane.tavrind." + std::string(name));
+}
+
+void DaemonTest::failOn(std::string operation, int error, std::string part)
+{
+    device.files.fault = [=](std::string_view op, const std::filesystem::path& path) {
+        return op == operation && path.string().contains(part) ? error : 0;
+    };
 }
 
 bool isEmptyAnswer(FakeCall& call)

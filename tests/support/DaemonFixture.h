@@ -13,10 +13,13 @@
 
 namespace tavrin::test {
 
+using namespace std::chrono_literals;
 using platform::Dictionary;
 using platform::Value;
 using platform::test::FakeCall;
 using platform::test::FakeConnection;
+using platform::test::LogCapture;
+using Strings = std::vector<std::string>;
 
 /// Keeps what the daemon records, in order.
 class RecordingSessionManager final : public ClientSessionManager {
@@ -24,7 +27,7 @@ public:
     explicit RecordingSessionManager(Assembly& assembly);
     void addTavrinFeedback(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void>) override;
     /// The classes of the records so far, taken out.
-    std::vector<std::string> takeClasses();
+    Strings takeClasses();
     template <class T> std::shared_ptr<T> last() const
     {
         return records.empty() ? nullptr : std::dynamic_pointer_cast<T>(records.back()->feedback());
@@ -53,17 +56,25 @@ struct DaemonTest : testing::Test {
     void respond(std::string body, int status = 200, platform::HttpHeaders headers = {});
     /// Answers the bag request that is under way.
     void deliverBag(std::string body = kBag) { respond(std::move(body)); }
+    /// Makes the bag stale, and asks for it, which begins the fetch of another.
+    void expireBag();
 
     std::shared_ptr<FakeConnection> connect(pid_t pid = 77);
     /// A client that has configured.
     std::shared_ptr<FakeConnection> client(std::string identifier = "com.quorvane.vistrel",
                                            std::string agent = "Vistrel/4", pid_t pid = 77);
     std::shared_ptr<FakeCall> configure(FakeConnection& connection, std::string identifier, std::string agent);
+    /// The client goes away.
+    void end(FakeConnection& connection);
+    std::shared_ptr<FakeCall> report(FakeConnection& connection, std::string className, Dictionary fields = {},
+                                     std::int64_t queryId = 1);
     std::shared_ptr<FakeCall> request(FakeConnection& connection, std::string className, std::int64_t queryId,
                                       Dictionary fields = {});
     std::shared_ptr<FakeCall> search(FakeConnection& connection, std::int64_t queryId, std::string query,
                                      Dictionary fields = {});
     std::int64_t counter(std::string_view name);
+    /// From here on, an operation on files whose path contains `part` fails.
+    void failOn(std::string operation, int error, std::string part = "");
 
     static constexpr const char* kBag =
         R"({"version": "9", "searchURL": "https://s.example/search", "warmURL": "https://s.example/warm",

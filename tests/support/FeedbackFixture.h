@@ -41,15 +41,13 @@ struct FeedbackTest : DaemonTest {
     void restart()
     {
         start();
-        device.drain();
         _uploadsBefore = 0;
     }
 
+    using DaemonTest::report;
     void report(const std::string& className, Dictionary fields = {}, std::int64_t queryId = 1)
     {
-        fields.set("class", className);
-        connection->call("ReportEvent", {"event", queryId, std::move(fields)});
-        device.drain();
+        report(*connection, className, std::move(fields), queryId);
     }
     void appear() { report("ZRSearchViewAppearFeedback", {{"isOnLockScreen", true}}); }
 
@@ -58,6 +56,12 @@ struct FeedbackTest : DaemonTest {
     {
         manager()->flushSession({});
         device.drain();
+    }
+    /// Leaves a closed session with one event.
+    void closeSession()
+    {
+        appear();
+        flushSession();
     }
     void fetchBag(std::string body)
     {
@@ -93,17 +97,17 @@ struct FeedbackTest : DaemonTest {
         return text ? platform::parseJson(*text).value_or(Value()) : Value();
     }
     /// The types of an upload's events, in order.
-    static std::vector<std::string> typesIn(const Value& session)
+    static Strings typesIn(const Value& session)
     {
-        std::vector<std::string> types;
+        Strings types;
         for (std::size_t i = 0; i < session["fb"].count(); ++i) types.push_back(*session["fb"][i]["type"].asString());
         return types;
     }
 
     /// The session files, by name.
-    std::vector<std::string> sessionFiles()
+    Strings sessionFiles()
     {
-        std::vector<std::string> names;
+        Strings names;
         for (const auto& [path, contents] : device.files.files)
             if (path.filename().string().starts_with("session.")) names.push_back(path.filename());
         return names;
@@ -126,6 +130,7 @@ struct FeedbackTest : DaemonTest {
         "crowdsourcingURL": "https://f.example/crowd?y=2", "clients": {"news": {"feedbackEnabled": false}}})";
 
     std::shared_ptr<FakeConnection> connection;
+    LogCapture log;
 
 private:
     std::size_t _uploadsBefore = 0;
