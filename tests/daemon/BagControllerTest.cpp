@@ -10,7 +10,6 @@
 namespace tavrin::test {
 namespace {
 
-using namespace std::chrono_literals;
 const std::filesystem::path kPath = "/caches/com.quorvane.tavrind/bag.plist";
 
 TEST(BagStaleness, IsDecidedByTimeThenByUrl)
@@ -63,6 +62,8 @@ TEST(BagVersion, OneThatDoesNotComeIsAskedForLessAndLessOften)
 }
 
 struct BagControllerTest : DaemonTest {
+    BagControllerTest() { start(); }
+
     TavrinBagController& controller() { return *assembly().bagController; }
     int announced = 0;
     std::vector<platform::Error> errors;
@@ -77,7 +78,6 @@ struct BagControllerTest : DaemonTest {
 
 TEST_F(BagControllerTest, FetchesOnceKeepsItOnDiskAndRestartsFromThere)
 {
-    start();
     EXPECT_EQ(tasks().size(), 1u) << "start-up asks for the first bag";
     EXPECT_EQ(device.transactions.open(), (std::map<std::string, int>{{"bagFetch", 1}}));
     EXPECT_FALSE(controller().currentBag());
@@ -113,7 +113,6 @@ TEST_F(BagControllerTest, FetchesOnceKeepsItOnDiskAndRestartsFromThere)
 // The service's faults: each leaves the current bag, is announced, and doesn't stop the next fetch.
 TEST_F(BagControllerTest, FailedFetchesLeaveTheOldBag)
 {
-    start();
     deliverBag();
     const std::string onDisk = device.files.files.at(kPath);
     const std::tuple<std::function<void()>, const char*, int> faults[]{
@@ -132,9 +131,7 @@ TEST_F(BagControllerTest, FailedFetchesLeaveTheOldBag)
         {[&] { lastTask()->respond(200, "{\"a\": \"\xff\"}"); }, nullptr, 0},
     };
     for (const auto& [fault, reason, code] : faults) {
-        device.clock.setWall(device.clock.wallNow() + 14400s);
-        (void)controller().currentBag();
-        device.drain();
+        expireBag();
         errors.clear();
         fault();
         device.drain();
@@ -168,7 +165,7 @@ TEST_F(BagControllerTest, ABrokenCacheFileIsAsGoodAsNone)
     }
     device.files.files.erase(kPath);
     device.files.directories.insert(kPath);
-    platform::test::LogCapture log;
+    LogCapture log;
     start();
     EXPECT_TRUE(log.has(platform::LogLevel::Fault, "Tavrin_Bag", "Error reading from bag cache: "));
     deliverBag();
@@ -178,8 +175,8 @@ TEST_F(BagControllerTest, ABrokenCacheFileIsAsGoodAsNone)
 TEST_F(BagControllerTest, AFullDiskCostsOnlyTheCache)
 {
     for (const char* operation : {"write", "mkdir"}) {
-        device.files.fault = [operation](std::string_view op, const auto&) { return op == operation ? ENOSPC : 0; };
-        platform::test::LogCapture log;
+        failOn(operation, ENOSPC);
+        LogCapture log;
         start();
         deliverBag();
         EXPECT_EQ(controller().currentBag()->version(), "9");
@@ -190,7 +187,6 @@ TEST_F(BagControllerTest, AFullDiskCostsOnlyTheCache)
 
 TEST_F(BagControllerTest, AsksTheConfiguredEndpoint)
 {
-    start();
     const auto url = [&](const char* country) { return controller().bagFetchURLWithCountry(country).string(); };
     EXPECT_EQ(url("CH"), "https://bag.quorvane.example/bag");
     EXPECT_EQ(url(""), "https://bag.quorvane.example/bag");
@@ -199,7 +195,7 @@ TEST_F(BagControllerTest, AsksTheConfiguredEndpoint)
     EXPECT_EQ(url("CN"), "https://bag-cn.quorvane.example/bag");
     device.userDefaults.set("TAVBagURL", "https://localhost:1/bag");
     EXPECT_EQ(url("CN"), "https://localhost:1/bag");
-    platform::test::LogCapture log;
+    LogCapture log;
     device.userDefaults.set("TAVBagURL", "not a url");
     EXPECT_EQ(url("CH"), "https://bag.quorvane.example/bag");
     EXPECT_TRUE(
@@ -208,19 +204,18 @@ TEST_F(BagControllerTest, AsksTheConfiguredEndpoint)
 
 TEST_F(BagControllerTest, OnlyAChangeOfTheUrlCausesAFetch)
 {
-    start();
+    const auto changeLocale = [&](std::string identifier) {
+        device.locale.context.identifier = std::move(identifier);
+        device.locale.handler(platform::LocaleSource::Change::Locale);
+        device.drain();
+    };
     deliverBag();
     device.locale.context.preferredLanguages = {"fr"}; // a header of the fetch, not in the URL
-    device.locale.handler(platform::LocaleSource::Change::Locale);
-    device.drain();
+    changeLocale(device.locale.context.identifier);
     EXPECT_EQ(tasks().size(), 1u);
-    device.locale.context.identifier = "fr_CH";
-    device.locale.handler(platform::LocaleSource::Change::Locale);
-    device.drain();
+    changeLocale("fr_CH");
     EXPECT_EQ(tasks().size(), 2u);
-    device.locale.context.identifier = "de_CH"; // while the bag for fr_CH is fetched
-    device.locale.handler(platform::LocaleSource::Change::Locale);
-    device.drain();
+    changeLocale("de_CH"); // while the bag for fr_CH is fetched
     deliverBag();
     (void)controller().currentBag();
     device.drain();
@@ -235,30 +230,25 @@ TEST_F(BagControllerTest, OnlyAChangeOfTheUrlCausesAFetch)
 
 TEST_F(BagControllerTest, TellsTheSystemWhenTheNewsClientsFortuneChanges)
 {
-    using Names = std::vector<std::string>;
-    start();
     deliverBag(R"({"clients": {"news": {"isEnabled": false}}})");
-    EXPECT_EQ(device.notifier.posted, Names{kNewsDisabledNotifyName});
+    EXPECT_EQ(device.notifier.posted, Strings{kNewsDisabledNotifyName});
     const auto refetch = [&](const char* body) {
         device.notifier.posted.clear();
-        device.clock.setWall(device.clock.wallNow() + 14400s);
-        (void)controller().currentBag();
-        device.drain();
+        expireBag();
         deliverBag(body);
         return device.notifier.posted;
     };
-    EXPECT_EQ(refetch(R"({"isEnabled": false})"), Names{});
-    EXPECT_EQ(refetch("{}"), Names{kNewsEnabledNotifyName});
+    EXPECT_EQ(refetch(R"({"isEnabled": false})"), Strings{});
+    EXPECT_EQ(refetch("{}"), Strings{kNewsEnabledNotifyName});
     device.notifier.posted.clear();
     start();
     EXPECT_TRUE(device.notifier.posted.empty()) << "a bag from disk is no news";
-    EXPECT_EQ(refetch("{}"), Names{});
-    EXPECT_EQ(refetch(R"({"isEnabled": false})"), Names{kNewsDisabledNotifyName});
+    EXPECT_EQ(refetch("{}"), Strings{});
+    EXPECT_EQ(refetch(R"({"isEnabled": false})"), Strings{kNewsDisabledNotifyName});
 }
 
 TEST_F(BagControllerTest, AnAnnouncedVersionThatNeverComesIsFetchedOnce)
 {
-    start();
     deliverBag();
     const auto announce = [&] { controller().forceFetchBag(Value::dictionaryOf({{"bag", 100}})); };
     for (int answer = 0; answer < 3; ++answer) {
@@ -276,7 +266,6 @@ TEST_F(BagControllerTest, AnAnnouncedVersionThatNeverComesIsFetchedOnce)
 
 TEST_F(BagControllerTest, ABagThatIsLargerOnDiskComesBack)
 {
-    start();
     deliverBag(R"({"version": 7, "text": "\u00fc)" + std::string(5u << 20, 'a') + "\"}");
     start();
     ASSERT_TRUE(controller().inMemoryBag());
@@ -285,13 +274,10 @@ TEST_F(BagControllerTest, ABagThatIsLargerOnDiskComesBack)
 
 TEST_F(BagControllerTest, AFetchThatNeverEndsIsGivenUp)
 {
-    start();
     EXPECT_EQ(lastTask()->originalRequest().maximumResponseSize, 8u << 20);
     device.advance(119s);
-    device.drain();
     EXPECT_TRUE(errors.empty());
     device.advance(1s);
-    device.drain();
     ASSERT_EQ(errors.size(), 1u);
     EXPECT_EQ(errors[0].code, platform::kUrlTimedOut);
     EXPECT_FALSE(controller().currentBag());
@@ -304,16 +290,13 @@ using BagFeedbackTest = FeedbackTest;
 
 TEST_F(BagFeedbackTest, AFetchIsASessionOfItsOwn)
 {
-    using Types = std::vector<std::string>;
-    for (const auto& [status, types] : {std::pair(200, Types{"network_search_start", "network_search_end"}),
+    for (const auto& [status, types] : {std::pair(200, Strings{"network_search_start", "network_search_end"}),
                                         {500, {"network_search_start", "network_search_end", "error"}}}) {
         startWithoutBag();
         deliverBag(kFeedbackBag);
         upload();
         const auto before = allUploads().size();
-        device.clock.setWall(device.clock.wallNow() + 14400s);
-        (void)assembly().bagController->currentBag();
-        device.drain();
+        expireBag();
         respond(kFeedbackBag, status);
         upload();
         EXPECT_EQ(allUploads().size(), before + 1);

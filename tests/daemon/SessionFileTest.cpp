@@ -7,18 +7,21 @@
 #include "tavrind/OutputStream.h"
 #include "tavrind/StoredSession.h"
 #include "tavrind/TavrinFeedbackFlusher.h"
+#include "tests/support/Encodings.h"
 #include "tests/support/Examples.h"
 #include "tests/support/FeedbackFixture.h"
 
 namespace tavrin::test {
 namespace {
 
-using platform::test::LogCapture;
-
 constexpr const char* kDirectory = "/caches/com.quorvane.tavrind/";
 
 struct SessionFileTest : FeedbackTest {
-    SessionFileTest() { device.files.directories.insert("/caches/com.quorvane.tavrind"); }
+    SessionFileTest()
+    {
+        device.files.directories.insert("/caches/com.quorvane.tavrind");
+        start();
+    }
 
     std::shared_ptr<TavrinPersistentStorage> storage() { return assembly().persistentStorage; }
     std::string& contents(const std::string& name) { return device.files.files.at(kDirectory + name); }
@@ -53,7 +56,7 @@ struct SessionFileTest : FeedbackTest {
         device.drain();
         return container;
     }
-    std::shared_ptr<FileContainer> closedFile(const std::vector<std::string>& inputs)
+    std::shared_ptr<FileContainer> closedFile(const Strings& inputs)
     {
         Feedbacks events;
         for (const std::string& input : inputs) events.push_back(feedback(input));
@@ -69,16 +72,16 @@ struct SessionFileTest : FeedbackTest {
     /// A file of an earlier process, adopted as it is.
     std::shared_ptr<FileContainer> adopted(const std::string& bytes)
     {
-        device.files.files[std::string(kDirectory) + "session.5"] = bytes;
         const std::filesystem::path path = std::string(kDirectory) + "session.5";
+        device.files.files[path] = bytes;
         const auto container = std::make_shared<FileContainer>(
             std::shared_ptr<const FileContainerStore>(std::shared_ptr<void>(), &storage()->store()), path);
         storage()->store().queue->sync([&container] { container->countFeedback(); });
         return container;
     }
-    static std::vector<std::string> inputsIn(const StoredSession& session)
+    static Strings inputsIn(const StoredSession& session)
     {
-        std::vector<std::string> inputs;
+        Strings inputs;
         for (const auto& each : session.feedbacks())
             inputs.push_back(*std::dynamic_pointer_cast<ZRDidGoToSiteFeedback>(each->feedback())->input);
         return inputs;
@@ -97,7 +100,6 @@ struct SessionFileTest : FeedbackTest {
 
 TEST_F(SessionFileTest, IsWhatTheFormatSays)
 {
-    start();
     const auto container = closedFile({"example.org"});
     EXPECT_EQ(platform::test::hexDump(contents(container->fileUrl().filename())),
               platform::test::hexDump(platform::test::hexDumpIn("formats.md")));
@@ -109,8 +111,7 @@ TEST_F(SessionFileTest, IsWhatTheFormatSays)
 
 TEST_F(SessionFileTest, CutAnywhereItGivesEveryWholeEventBeforeTheCut)
 {
-    start();
-    const std::vector<std::string> inputs{"a", "bb", "ccc", "dddd"};
+    const Strings inputs{"a", "bb", "ccc", "dddd"};
     const std::string whole = contents(closedFile(inputs)->fileUrl().filename());
     const auto ends = recordEnds(whole);
     ASSERT_EQ(ends.size(), 6u);
@@ -129,8 +130,9 @@ TEST_F(SessionFileTest, CutAnywhereItGivesEveryWholeEventBeforeTheCut)
 TEST_F(SessionFileTest, LimitsToTheByte)
 {
     device.userDefaults.set("TAVSessionSizeLimit", 1000);
-    start();
-    LogCapture log;
+    settle();
+    startWithoutBag();
+    LogCapture lines;
     auto container = storage()->createFileContainerForWriting(FileUse::Session);
     container->writeSessionHeader(header());
     device.drain();
@@ -145,7 +147,7 @@ TEST_F(SessionFileTest, LimitsToTheByte)
     };
     write(room); // to exactly 1000 bytes
     EXPECT_EQ(counter("filesizeexceeded"), 1);
-    EXPECT_EQ(log.count("exceeds max session size (1000)"), 1);
+    EXPECT_EQ(lines.count("exceeds max session size (1000)"), 1);
     write(room - 1);
     EXPECT_EQ(contents(name).size(), 999u) << "a smaller one still fits";
     EXPECT_EQ(called, (std::vector{false, true}));
@@ -161,7 +163,6 @@ TEST_F(SessionFileTest, LimitsToTheByte)
 
 TEST_F(SessionFileTest, ARecordThatFailedIsNotThere)
 {
-    start();
     std::set<int> failing; // of the writes from here on
     const auto failFrom = [&](std::set<int> writes) {
         failing = std::move(writes);
@@ -169,7 +170,6 @@ TEST_F(SessionFileTest, ARecordThatFailedIsNotThere)
             return operation == "append" && failing.contains(write++) ? ENOSPC : 0;
         };
     };
-    LogCapture log;
     auto container = storage()->createFileContainerForWriting(FileUse::Session);
     failFrom({1}); // the version is written, the header fails
     container->writeSessionHeader(header());
@@ -191,21 +191,12 @@ TEST_F(SessionFileTest, ARecordThatFailedIsNotThere)
     EXPECT_EQ(contents(container->fileUrl().filename()), "");
 
     failFrom({3, 5});
-    EXPECT_EQ(inputsIn(*closedFile({"1", "2", "3", "4", "5"})->read().session),
-              (std::vector<std::string>{"1", "3", "5"}));
+    EXPECT_EQ(inputsIn(*closedFile({"1", "2", "3", "4", "5"})->read().session), (Strings{"1", "3", "5"}));
 }
 
 TEST_F(SessionFileTest, WhatIsNoSessionFileIsNotRead)
 {
-    start();
-    const auto framed = [](std::initializer_list<std::string> archives) {
-        std::string bytes;
-        for (const std::string& archive : archives) {
-            const std::uint64_t length = archive.size();
-            bytes.append(reinterpret_cast<const char*>(&length), sizeof(length)).append(archive);
-        }
-        return bytes;
-    };
+    using platform::test::framed;
     const std::string version = platform::archiveValue(ClientSessionManager::tavrindUserAgent());
     const std::string head = platform::archive(header()), event = platform::archive(*feedback("x"));
     for (const auto& [bytes, says] :
@@ -213,36 +204,34 @@ TEST_F(SessionFileTest, WhatIsNoSessionFileIsNotRead)
           {std::string(8, '\0'), "out of range"},
           {std::string(9, '\0'), "empty data file"},
           {std::string(8, '\xff') + "x", "broken version string in file"},
-          {framed({platform::archiveValue(7)}), "version string not stored"},
-          {framed({platform::archiveValue("tavrind/0.0.1")}), "version not supported: tavrind/0.0.1"},
-          {framed({version}), "client session not stored"},
-          {framed({version, event}), "client session not stored"}}) {
-        LogCapture log;
+          {framed(platform::archiveValue(7)), "version string not stored"},
+          {framed(platform::archiveValue("tavrind/0.0.1")), "version not supported: tavrind/0.0.1"},
+          {framed(version), "client session not stored"},
+          {framed(version) + framed(event), "client session not stored"}}) {
+        LogCapture lines;
         EXPECT_FALSE(adopted(bytes)->read().session);
-        EXPECT_EQ(log.count(says), 1) << says;
+        EXPECT_EQ(lines.count(says), 1) << says;
     }
     // What is no event ends the file: a bare length, what can't be read, another record.
     const struct {
         std::string bytes;
         std::uint64_t lost;
         int unreadable;
-    } ends[]{{framed({version, head, event}) + std::string(8, '\0'), 0, 1},
-             {framed({version, head, event, "\xc1", event}), 2, 1},
-             {framed({version, head, event, head, event}), 2, 0}};
+    } ends[]{
+        {std::string(8, '\0'), 0, 1}, {framed("\xc1") + framed(event), 2, 1}, {framed(head) + framed(event), 2, 0}};
     for (const auto& end : ends) {
-        LogCapture log;
-        const auto [session, lost, fate] = adopted(end.bytes)->read();
-        EXPECT_EQ(inputsIn(*session), std::vector<std::string>{"x"});
+        LogCapture lines;
+        const auto [session, lost, fate] = adopted(framed(version) + framed(head) + framed(event) + end.bytes)->read();
+        EXPECT_EQ(inputsIn(*session), Strings{"x"});
         EXPECT_EQ(lost, end.lost);
         EXPECT_EQ(fate, FeedbackFate::DamagedTail);
-        EXPECT_EQ(log.count("tavrin feedback expected"), 1);
-        EXPECT_EQ(log.count("could not unarchive feedback range"), end.unreadable);
+        EXPECT_EQ(lines.count("tavrin feedback expected"), 1);
+        EXPECT_EQ(lines.count("could not unarchive feedback range"), end.unreadable);
     }
 }
 
 TEST_F(SessionFileTest, TheProcessIsWantedWhileItWrites)
 {
-    start();
     std::map<std::string, int> meanwhile;
     device.files.fault = [&](std::string_view operation, const auto&) {
         if (operation == "append") meanwhile = device.transactions.open();
@@ -255,7 +244,6 @@ TEST_F(SessionFileTest, TheProcessIsWantedWhileItWrites)
 
 TEST_F(SessionFileTest, EveryReadGivesTheSameUpload)
 {
-    start();
     const auto chosen = std::make_shared<ZRSuggestionEngagementFeedback>();
     chosen->suggestion = std::make_shared<ZRSearchSuggestion>();
     chosen->suggestion->identifier = "private";
@@ -279,7 +267,6 @@ TEST_F(SessionFileTest, EveryReadGivesTheSameUpload)
 
 TEST_F(SessionFileTest, UploadsAreInOrderOfTime)
 {
-    start();
     Feedbacks engagements;
     for (const std::uint64_t milliseconds : {70u, 50u, 1050u, 60u}) {
         const auto engagement = std::make_shared<ZRResultEngagementFeedback>();
@@ -300,10 +287,9 @@ TEST_F(SessionFileTest, UploadsAreInOrderOfTime)
 
 TEST_F(SessionFileTest, FilesOfAnEarlierProcessAreCountedOneByOneAfterTheStart)
 {
-    start();
     device.files.files.clear(); // of the daemon's own sessions
     for (int i = 0; i < 3; ++i) closedFile({"a", "b"});
-    std::vector<std::string> operations;
+    Strings operations;
     std::shared_ptr<FileContainer> written;
     device.files.fault = [&](std::string_view operation, const std::filesystem::path& path) {
         if (!path.filename().string().starts_with("session.") || operation == "info") return 0;
@@ -316,58 +302,50 @@ TEST_F(SessionFileTest, FilesOfAnEarlierProcessAreCountedOneByOneAfterTheStart)
     EXPECT_TRUE(operations.empty()) << "no file is read while the daemon starts";
     written = scanned->createFileContainerForWriting(FileUse::Session);
     device.drain();
-    EXPECT_EQ(operations, (std::vector<std::string>{"create", "read", "append", "read", "read"}));
+    EXPECT_EQ(operations, (Strings{"create", "read", "append", "read", "read"}));
     EXPECT_EQ(booked(FeedbackFate::Closed) - before, 6);
 }
 
 TEST_F(SessionFileTest, NumbersGoOn)
 {
-    start();
-    struct Case {
-        std::vector<std::string> names;
-        const char* next;
-        std::size_t adopted;
-    };
-    for (const Case& each : {Case{{}, "session.1", 0},
-                             {{"session.3", "session.10", "bag.plist"}, "session.11", 2},
-                             {{"session.x", "session.", "session.-4", "session.+5", "session. 6"}, "session.1", 5},
-                             {{"session.99999999999999", "session.2147483647", "session.7"}, "session.8", 3},
-                             {{"session.0012"}, "session.13", 1}}) {
+    for (const auto& [names, next, adopted] :
+         {std::tuple(Strings(), "session.1", 0u),
+          {{"session.3", "session.10", "bag.plist"}, "session.11", 2},
+          {{"session.x", "session.", "session.-4", "session.+5", "session. 6"}, "session.1", 5},
+          {{"session.99999999999999", "session.2147483647", "session.7"}, "session.8", 3},
+          {{"session.0012"}, "session.13", 1}}) {
         device.files.files.clear();
-        for (const std::string& name : each.names) device.files.files[kDirectory + name] = "x";
+        for (const std::string& name : names) device.files.files[kDirectory + name] = "x";
         const auto scanned = TavrinPersistentStorage::make(assembly());
-        EXPECT_EQ(scanned->getAvailableSessionHandles().size(), each.adopted) << each.next;
-        EXPECT_EQ(scanned->createFileContainerForWriting(FileUse::Session)->fileUrl().filename(), each.next);
+        EXPECT_EQ(scanned->getAvailableSessionHandles().size(), adopted) << next;
+        EXPECT_EQ(scanned->createFileContainerForWriting(FileUse::Session)->fileUrl().filename(), next);
     }
 }
 
 TEST_F(SessionFileTest, OldFilesAreDeleted)
 {
-    start();
     device.files.files.clear();
     const platform::Date now = device.clock.wallNow();
-    const auto place = [&](const char* name, std::chrono::seconds age) {
-        device.files.files[std::string(kDirectory) + name] = "x";
-        device.files.created[std::string(kDirectory) + name] = now - age;
+    const auto place = [&](const std::string& name, std::chrono::seconds age) {
+        device.files.files[kDirectory + name] = "x";
+        device.files.created[kDirectory + name] = now - age;
     };
-    place("session.1", std::chrono::hours(48) + std::chrono::seconds(1));
-    place("session.2", std::chrono::hours(47));
-    place("session.3", std::chrono::hours(-24 * 365)); // the clock was set back
+    place("session.1", 48h + 1s);
+    place("session.2", 47h);
+    place("session.3", -365 * 24h); // the clock was set back
     const auto scanned = TavrinPersistentStorage::make(assembly());
     device.drain();
-    EXPECT_EQ(sessionFiles(), (std::vector<std::string>{"session.2", "session.3"}));
+    EXPECT_EQ(sessionFiles(), (Strings{"session.2", "session.3"}));
     EXPECT_EQ(counter("filetooold"), 1);
 
     device.files.files.clear();
-    for (int number = 1; number <= 2100; ++number)
-        place(("session." + std::to_string(number)).c_str(), std::chrono::hours(49));
+    for (int number = 1; number <= 2100; ++number) place("session." + std::to_string(number), 49h);
     const auto again = TavrinPersistentStorage::make(assembly());
     EXPECT_TRUE(again->createFileContainerForWriting(FileUse::Session)) << "before the old ones are gone";
 }
 
 TEST_F(SessionFileTest, WhatStandsInTheWayIsLeftAlone)
 {
-    start();
     device.files.files.clear();
     device.files.directories.insert(std::string(kDirectory) + "session.5");
     const auto scanned = TavrinPersistentStorage::make(assembly());
