@@ -14,18 +14,11 @@
 namespace tavrin::test {
 namespace {
 
-using namespace std::chrono_literals;
-
 struct ConnectionTest : DaemonTest {
     ConnectionTest()
     {
         start();
         deliverBag();
-    }
-    void report(FakeConnection& connection, std::string className, Dictionary fields = {})
-    {
-        fields.set("class", std::move(className));
-        (void)call(connection, "ReportEvent", {"event", 3, std::move(fields)});
     }
     std::shared_ptr<FakeCall> call(FakeConnection& connection, const char* member, std::vector<Value> args = {})
     {
@@ -37,6 +30,7 @@ struct ConnectionTest : DaemonTest {
     {
         return {{"class", "TAVSessionConfiguration"}, {"identifier", identifier}, {"userAgent", agent}};
     }
+    LogCapture log;
 };
 
 TEST_F(ConnectionTest, ConfigureAnswersTheEndpointThenPushesTheBag)
@@ -69,13 +63,13 @@ TEST_F(ConnectionTest, AnInvalidConfigurationClosesTheConnection)
              {Dictionary{{"class", "TAVSessionConfiguration"}}, incomplete},
              {Dictionary{{"class", "TAVSessionConfiguration"}, {"identifier", "id"}}, incomplete},
              {configuration("", "A/1"), "client session identifier cannot be nil or empty"}}) {
-        platform::test::LogCapture log;
+        const LogCapture log;
         auto connection = connect();
         EXPECT_TRUE(call(*connection, "Configure", {invalid})->abandoned());
         EXPECT_TRUE(connection->invalidated());
         EXPECT_TRUE(log.has(platform::LogLevel::Fault, "Tavrin_Session", text));
         EXPECT_TRUE(log.has(platform::LogLevel::Fault, "Tavrin_Session", "invalid configuration, closing connection"));
-        EXPECT_EQ(session->takeClasses(), std::vector<std::string>{"ZRErrorFeedback"});
+        EXPECT_EQ(session->takeClasses(), Strings{"ZRErrorFeedback"});
     }
 }
 
@@ -94,7 +88,6 @@ TEST_F(ConnectionTest, AClientWithoutANameHasNoBag)
 TEST_F(ConnectionTest, ASecondIdentifierKeepsTheFirstState)
 {
     auto connection = client("com.quorvane.vistrel");
-    platform::test::LogCapture log;
     EXPECT_TRUE(configure(*connection, "com.quorvane.news", "news/1")->answered());
     EXPECT_TRUE(log.has(platform::LogLevel::Fault, "Tavrin_Session", "session identifier must match"));
     EXPECT_EQ(assembly().clientStateManager->sessions().size(), 1u);
@@ -111,8 +104,7 @@ TEST_F(ConnectionTest, AnUnconfiguredConnectionIsServedWhatNeedsNoClient)
               Value(404));
     EXPECT_EQ(call(*connection, "Status")->argument(0)["bag"]["version"], Value("9"));
     report(*connection, "ZRClearInputFeedback");
-    connection->end();
-    device.drain();
+    end(*connection);
     EXPECT_TRUE(daemon->service->getClientConnections().empty());
 }
 
@@ -163,7 +155,6 @@ TEST_F(ConnectionTest, MissingDefaultsAreCompletedFromTheDevice)
 {
     device.profile.current.screenScale = 3;
     auto connection = client();
-    platform::test::LogCapture log;
     (void)search(*connection, 1, "weat", {{"scale", 0.0}, {"keyboardInputMode", ""}});
     EXPECT_EQ(*lastTask()->originalRequest().headers.find("X-Quorvane-UI-Scale"), "3.0");
     EXPECT_EQ(lastTask()->originalRequest().url.queryValue("kb_ime"), "en_US@layout=default");
@@ -241,7 +232,6 @@ TEST_F(ConnectionTest, EveryIdentifierHasAStateButNotWithoutEnd)
 
 TEST_F(ConnectionTest, CountsConnectionsAndTheirEnds)
 {
-    platform::test::LogCapture log;
     auto first = client("com.quorvane.vistrel", "Vistrel/4", 90);
     EXPECT_EQ(log.count("too many connections"), 0);
     auto second = connect(90);
@@ -249,8 +239,7 @@ TEST_F(ConnectionTest, CountsConnectionsAndTheirEnds)
     EXPECT_TRUE(second->resumed()) << "it is accepted all the same";
     EXPECT_EQ(counter("clientconnection"), 2);
     EXPECT_EQ(counter("launch"), 1);
-    first->end();
-    device.drain();
+    end(*first);
     EXPECT_EQ(counter("vistrel.xcpinvalidation"), 1);
     EXPECT_EQ(log.count("session not flushed on invalidation"), 1);
     EXPECT_EQ(daemon->service->getClientConnections().size(), 1u);
@@ -260,7 +249,6 @@ TEST_F(ConnectionTest, NamesItsPeer)
 {
     device.processes.applications[1] = "org.example.Browser";
     device.processes.paths[2] = "/usr/lib/search screen";
-    platform::test::LogCapture log;
     EXPECT_EQ(TavrinService::clientIDForConnection(device.processes, 1), "org.example.Browser");
     EXPECT_EQ(TavrinService::clientIDForConnection(device.processes, 2), "search screen");
     EXPECT_EQ(TavrinService::clientIDForConnection(device.processes, 3), std::nullopt);
@@ -271,9 +259,8 @@ TEST_F(ConnectionTest, NamesItsPeer)
 TEST_F(ConnectionTest, EventsReachTheSessionWithTheirQuery)
 {
     auto connection = client();
-    report(
-        *connection, "ZRResultEngagementFeedback",
-        {{"result", Value::dictionaryOf({{"class", "ZRSearchResult"}, {"queryId", 12}, {"type", 1}, {"topHit", 2}})}});
+    report(*connection, "ZRResultEngagementFeedback",
+           {{"result", Dictionary{{"class", "ZRSearchResult"}, {"queryId", 12}, {"type", 1}, {"topHit", 2}}}}, 3);
     ASSERT_EQ(session->records.size(), 1u);
     const TavrinFeedback& record = *session->records[0];
     EXPECT_EQ(record.queryId, 3);

@@ -1,7 +1,5 @@
 #include "tavrind/Lookup.h"
 
-#include <gtest/gtest.h>
-
 #include "CoreTavrin/TAVBag.h"
 #include "CoreTavrin/TAVRequest.h"
 #include "platform/values/Json.h"
@@ -11,7 +9,6 @@
 namespace tavrin::test {
 namespace {
 
-using namespace std::chrono_literals;
 using platform::Url;
 
 struct LookupTest : DaemonTest {
@@ -46,7 +43,7 @@ struct LookupTest : DaemonTest {
                device.dataDetectors->clientSignature(kind).value_or("-");
     }
 
-    platform::test::LogCapture log;
+    LogCapture log;
 };
 
 TEST_F(LookupTest, HintsAreInstalledWhenTheyComeAndGoWithTheirResource)
@@ -77,7 +74,7 @@ TEST_F(LookupTest, StartupInstallsOnlyWhatTheStoreDoesNotHave)
 {
     offer({{"TAVLookupHintsWeekly", "https://r.example/w"}});
     deliver("weeks", "https://r.example/de/hints/2026/w1");
-    std::vector<std::string> written;
+    Strings written;
     device.files.fault = [&](std::string_view operation, const std::filesystem::path& path) {
         if (operation == "write" && path.parent_path() == "/data/data-detectors") written.push_back(path.filename());
         return 0;
@@ -88,11 +85,11 @@ TEST_F(LookupTest, StartupInstallsOnlyWhatTheStoreDoesNotHave)
 
     device.files.files.erase("/data/data-detectors/2.signature"); // as if it had ended in between
     start();
-    EXPECT_EQ(written, (std::vector<std::string>{"2.source", "2.signature"}));
+    EXPECT_EQ(written, (Strings{"2.source", "2.signature"}));
     EXPECT_EQ(installed(Lookup::Weekly), "weeks 2026-w1-hints");
 
     device.files.files["/data/data-detectors/2.signature"] = "2025-w9-hints";
-    device.files.fault = [](auto operation, auto&) { return operation == "write" ? ENOSPC : 0; };
+    failOn("write", ENOSPC);
     start();
     EXPECT_EQ(log.count("signature (2025-w9-hints) does not match version (2026-w1-hints), DD for kind: 2"), 1);
     EXPECT_TRUE(log.count("failed to push data to data detectors"));
@@ -162,7 +159,7 @@ TEST(LookupFilter, KeepsResultsWhoseKeywordsCompletionAndSubjectFit)
         EXPECT_EQ(copy[0]["results"].count(), 3u) << "another's copy is untouched";
     }
 
-    platform::test::LogCapture log;
+    LogCapture log;
     platform::Log::privateData = false;
     request.queryContext.reset();
     Value response = platform::parseJson(R"([{"results": [{"lookup_instructions": {"completion": "x"}}]}])").value();

@@ -13,7 +13,6 @@
 namespace tavrin::test {
 namespace {
 
-using namespace std::chrono_literals;
 using platform::Date;
 constexpr Date kNow{};
 
@@ -99,6 +98,7 @@ struct QueryCacheTest : DaemonTest {
     {
         start();
         deliverBag();
+        connection = client();
         cache = QueryCache::make(assembly());
     }
     void put(std::string_view input, Dictionary resultSet, double scale = 0)
@@ -132,6 +132,7 @@ struct QueryCacheTest : DaemonTest {
                 {"country", [this] { device.profile.change({.countryCode = "CN"}); }},
                 {"GUID", [this] { assembly().guidController->reset(); }}};
     }
+    std::shared_ptr<FakeConnection> connection;
     std::shared_ptr<QueryCache> cache;
 };
 
@@ -148,7 +149,7 @@ TEST_F(QueryCacheTest, AnswersWhoTypesOn)
 
 TEST_F(QueryCacheTest, TakesOnlyWhatCanBeFound)
 {
-    platform::test::LogCapture log;
+    LogCapture log;
     put("weather in", {{"query", "weather"}});
     EXPECT_TRUE(log.has(platform::LogLevel::Error, "Tavrin_Caching",
                         "BUG: NOT caching 'weather in' because input is longer than completed query 'weather'"));
@@ -183,7 +184,7 @@ TEST_F(QueryCacheTest, ScalesAreComparedAsTheyAreSent)
 
 TEST_F(QueryCacheTest, KeepsToItsCost)
 {
-    platform::test::LogCapture log;
+    LogCapture log;
     put("a", sized("a", 1398102)); // and half as much again is 2 MiB and one
     EXPECT_TRUE(log.has(platform::LogLevel::Error, "Tavrin_Caching", "NOT caching 'a' with cost 2097153"));
     put("b", sized("b", 1398101));
@@ -225,7 +226,6 @@ TEST_F(QueryCacheTest, ChangesOfTheDeviceClearIt)
 // An answer that was asked for under the old GUID, country, locale or agent comes too late for the new one.
 TEST_F(QueryCacheTest, AnswersOfBeforeAChangeAreNotStored)
 {
-    auto connection = client();
     auto all = changes();
     all.emplace_back("none", [] {});
     all.emplace_back("agent", [&] { configure(*connection, "com.quorvane.vistrel", "Vistrel/5"); });
@@ -245,7 +245,6 @@ TEST_F(QueryCacheTest, AnswersOfBeforeAChangeAreNotStored)
 
 TEST_F(QueryCacheTest, TheAnswerToTheSearchThatReplacesTheGuidIsStored)
 {
-    auto connection = client();
     device.advance(15min);
     (void)search(*connection, 1, "weat");
     respond(R"([{"query": "weather"}])");
@@ -254,7 +253,6 @@ TEST_F(QueryCacheTest, TheAnswerToTheSearchThatReplacesTheGuidIsStored)
 
 TEST_F(QueryCacheTest, ASearchIsAnsweredFromIt)
 {
-    auto connection = client();
     (void)search(*connection, 1, "weat");
     const auto uuid = session->last<ZRStartNetworkSearchFeedback>()->uuid;
     respond(R"([{"status": "OK", "query": "weather"}, {"status": "ERROR", "query": "weathers"}, 7])");
@@ -286,7 +284,7 @@ TEST_F(QueryCacheTest, ASearchIsAnsweredFromIt)
 TEST_F(QueryCacheTest, CanBeSwitchedOff)
 {
     device.userDefaults.set("TAVNoQueryCache", true);
-    auto connection = client("com.quorvane.wendral", "Wendral/1");
+    connection = client("com.quorvane.wendral", "Wendral/1");
     (void)search(*connection, 1, "weat");
     respond(R"([{"query": "weather"}])");
     EXPECT_TRUE(search(*connection, 2, "weathe")->pending());

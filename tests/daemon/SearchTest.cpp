@@ -10,8 +10,6 @@
 namespace tavrin::test {
 namespace {
 
-using namespace std::chrono_literals;
-using Classes = std::vector<std::string>;
 constexpr const char* kAnswer =
     R"([{"status": "OK", "fbq": "f1", "duration": 12.5, "partial_client_ip": "10.0.x", "query": "weather"}])";
 
@@ -20,16 +18,18 @@ struct SearchTest : DaemonTest {
     {
         start();
         deliverBag();
+        connection = client();
     }
+
+    std::shared_ptr<FakeConnection> connection;
 };
 
 TEST_F(SearchTest, TravelsToTheServiceAndBack)
 {
-    auto connection = client();
     auto call = search(*connection, 1, "weat", {{"clientQueryId", 5}, {"triggerEvent", 1}});
     EXPECT_TRUE(call->pending());
     EXPECT_EQ(lastTask()->originalRequest().url.queryValue("q"), "weat");
-    EXPECT_EQ(session->takeClasses(), Classes{"ZRStartNetworkSearchFeedback"});
+    EXPECT_EQ(session->takeClasses(), Strings{"ZRStartNetworkSearchFeedback"});
     lastTask()->timing = Value::dictionaryOf({{"mark", 1}});
     respond(kAnswer);
 
@@ -55,7 +55,6 @@ TEST_F(SearchTest, TravelsToTheServiceAndBack)
 
 TEST_F(SearchTest, VerboseRepliesShowTheExchange)
 {
-    auto connection = client();
     auto call = search(*connection, 1, "weat", {{"verboseReply", true}});
     respond(kAnswer, 200, {{"X-A", "1"}});
     EXPECT_TRUE(call->argument(1)["httpRequest"]["url"].asString()->starts_with("https://s.example/search?"));
@@ -65,7 +64,6 @@ TEST_F(SearchTest, VerboseRepliesShowTheExchange)
 
 TEST_F(SearchTest, AnOvertakenAnswerIsNeverDelivered)
 {
-    auto connection = client();
     auto five = search(*connection, 5, "weat");
     auto slow = lastTask();
     auto six = search(*connection, 6, "weath");
@@ -84,7 +82,6 @@ TEST_F(SearchTest, AnOvertakenAnswerIsNeverDelivered)
 
 TEST_F(SearchTest, SkipsWhatNeedsNoSearch)
 {
-    auto connection = client();
     const std::size_t before = tasks().size();
     EXPECT_TRUE(isEmptyAnswer(*search(*connection, 1, "w")));
     EXPECT_EQ(session->last<TAVSkipSearchFeedback>()->triggerEvent, SkipSearchTrigger::LessThanMinimumQueryLength);
@@ -97,18 +94,15 @@ TEST_F(SearchTest, SkipsWhatNeedsNoSearch)
     EXPECT_EQ(tasks().size(), before + 2);
 }
 
-// What the service may answer, and what the client and the session then get.
-struct Answer {
-    const char* name;
-    std::string body;
-    bool read;       // the reply has a raw response, else an error
-    const char* end; // the record after the start record
-    int status = 200;
-};
-
 TEST_F(SearchTest, EveryAnswerOfTheServiceIsAnswered)
 {
-    const Answer answers[]{
+    const struct {
+        const char* name;
+        std::string body;
+        bool read;       // the reply has a raw response, else an error
+        const char* end; // the record after the start record
+        int status = 200;
+    } answers[]{
         {"error status with JSON", R"([{"status": "ERROR"}])", true, "TAVEndNetworkSearchFeedback", 500},
         {"empty array", "[]", true, "ZREndNetworkSearchFeedback"},
         {"object", R"({"status": "OK"})", true, "ZREndNetworkSearchFeedback"},
@@ -119,9 +113,8 @@ TEST_F(SearchTest, EveryAnswerOfTheServiceIsAnswered)
         {"deep", std::string(200, '['), false, "ZREndNetworkSearchFeedback"},
         {"invalid UTF-8", "[\"\xff\"]", false, "ZREndNetworkSearchFeedback"},
     };
-    auto connection = client();
     std::int64_t id = 0;
-    for (const Answer& answer : answers) {
+    for (const auto& answer : answers) {
         SCOPED_TRACE(answer.name);
         auto call = search(*connection, ++id, "weat");
         session->takeClasses();
@@ -130,13 +123,12 @@ TEST_F(SearchTest, EveryAnswerOfTheServiceIsAnswered)
         EXPECT_GT(call->argument(1).count(), 0u);
         EXPECT_EQ(!call->argument(1)["rawResponse"].isNull(), answer.read);
         EXPECT_EQ(call->argument(2).count() > 0, !answer.read);
-        EXPECT_EQ(session->takeClasses(), Classes{answer.end});
+        EXPECT_EQ(session->takeClasses(), Strings{answer.end});
     }
 }
 
 TEST_F(SearchTest, TransportErrorsReachTheClientAndTheSession)
 {
-    auto connection = client();
     auto call = search(*connection, 1, "weat");
     lastTask()->fail(platform::Error::withReason("UrlErrorDomain", -1004, "refused"));
     device.drain();
@@ -183,7 +175,6 @@ TEST_F(SearchTest, RequestsNameTheGuidOfTheirClient)
 
 TEST_F(SearchTest, TheServiceMayForceANewBag)
 {
-    auto connection = client();
     const auto fetchesAfter = [&](const char* header) {
         static std::int64_t id = 0;
         (void)search(*connection, ++id, "weat");
@@ -194,7 +185,7 @@ TEST_F(SearchTest, TheServiceMayForceANewBag)
     EXPECT_EQ(fetchesAfter(R"({"bag": 9})"), 0u);
     EXPECT_EQ(fetchesAfter(R"({"bag": "10"})"), 0u) << "not a number";
     EXPECT_EQ(fetchesAfter(R"({"other": 1})"), 0u);
-    platform::test::LogCapture log;
+    LogCapture log;
     EXPECT_EQ(fetchesAfter("[1]"), 0u);
     EXPECT_EQ(fetchesAfter("{"), 0u);
     EXPECT_EQ(log.count("Failed to deserialize X-Quorvane-ForceFetch"), 2);
@@ -206,7 +197,7 @@ TEST_F(SearchTest, TheServiceMayForceANewBag)
 TEST_F(SearchTest, WaitsASecondForTheFirstBag)
 {
     startWithoutBag();
-    auto connection = client();
+    connection = client();
     auto first = search(*connection, 1, "weat");
     auto bag = connection->call("Bag");
     device.advance(999ms);
@@ -232,9 +223,7 @@ TEST_F(SearchTest, TheBagsArrivalWakesEveryWaiterOfAClient)
     auto two = client("com.quorvane.vistrel", "Vistrel/4", 2);
     auto first = search(*one, 1, "weat");
     auto second = search(*two, 1, "weat");
-    const auto bagTask = lastTask();
-    bagTask->respond(200, kBag);
-    device.drain();
+    deliverBag();
     EXPECT_TRUE(first->pending() && second->pending());
     EXPECT_EQ(tasks().size(), 3u) << "the bag and both searches";
 }
@@ -243,8 +232,8 @@ TEST_F(SearchTest, TheLogDoesNotTellWhatTheUserTypesAndSees)
 {
     using platform::LogLevel;
     platform::Log::privateData = false;
-    platform::test::LogCapture log;
-    auto connection = client();
+    LogCapture log;
+    connection = client();
     (void)search(*connection, 1, "secret");
     respond(R"([{"query": "secret words", "icon": {"url": "https://a.example/secret"}}, {"query": "secr"}])");
     respond("pixels"); // the image's
@@ -272,7 +261,7 @@ struct Kind {
     std::vector<std::uint32_t> trace = {};
     std::size_t attempts = 1;  // that a service that never answers sees
     bool needsBag = true;      // else it is performed without one, or with a disabled one
-    Classes whenDisabled = {}; // the records that a disabled bag leaves
+    Strings whenDisabled = {}; // the records that a disabled bag leaves
 };
 
 const Kind kKinds[]{
@@ -344,9 +333,9 @@ TEST_F(KindsTest, EachTakesItsRoad)
 {
     for (const Kind& kind : kKinds) {
         SCOPED_TRACE(kind.className);
-        auto connection = client();
+        connection = client();
         device.advance(31s); // the connection is no longer warm
-        platform::test::LogCapture log;
+        LogCapture log;
         auto call = ask(*connection, kind);
         EXPECT_TRUE(lastTask()->originalRequest().url.string().starts_with(kind.url));
         const auto start = session->last<ZRStartNetworkSearchFeedback>();
@@ -361,9 +350,7 @@ TEST_F(KindsTest, EachTakesItsRoad)
         EXPECT_EQ(session->records.back()->userAgent, "Vistrel/4");
 
         const std::size_t sent = tasks().size();
-        connection->call("ReportEvent",
-                         {"event", 1, Dictionary{{"class", "ZRSearchViewAppearFeedback"}, {"viewAppearEvent", 2}}});
-        device.drain();
+        report(*connection, "ZRSearchViewAppearFeedback", {{"viewAppearEvent", 2}});
         EXPECT_EQ(tasks().size(), sent) << "any request keeps the connection warm";
 
         const std::size_t half = kind.trace.size() / 2;
@@ -378,7 +365,7 @@ TEST_F(KindsTest, EachTakesItsRoad)
     EXPECT_EQ(counter("search"), 1);
     EXPECT_EQ(counter("vistrel.keystrokes"), 1);
 
-    auto connection = client();
+    connection = client();
     tracePoints.clear();
     connection->call("Feedback", {""});
     device.drain();
@@ -391,7 +378,7 @@ TEST_F(KindsTest, EachFailsWithItsQuery)
 {
     for (const Kind& kind : kKinds) {
         SCOPED_TRACE(kind.className);
-        auto connection = client();
+        connection = client();
         const std::size_t before = tasks().size();
         auto call = ask(*connection, kind);
         for (std::size_t i = 0; i < kind.attempts; ++i) {
@@ -403,14 +390,14 @@ TEST_F(KindsTest, EachFailsWithItsQuery)
         EXPECT_EQ(reasonOf(*call), "refused");
         ASSERT_EQ(session->records.size(), 3u);
         for (const auto& record : session->records) EXPECT_EQ(record->clientQueryId, 9u);
-        EXPECT_EQ(session->takeClasses(), (Classes{kind.startClass, "ZRErrorFeedback", "ZREndNetworkSearchFeedback"}));
+        EXPECT_EQ(session->takeClasses(), (Strings{kind.startClass, "ZRErrorFeedback", "ZREndNetworkSearchFeedback"}));
     }
 }
 
 TEST_F(KindsTest, ALookupIsNotRepeatedAfterTheClientsTimeOut)
 {
     for (const auto& [timeout, limit] : {std::pair(0.0, 60s), {5.0, 5s}}) {
-        auto connection = connect();
+        connection = connect();
         connection->call("Configure", {Value::dictionaryOf({{"class", "TAVSessionConfiguration"},
                                                             {"identifier", "com.quorvane.vistrel"},
                                                             {"userAgent", "Vistrel/4"},
@@ -430,7 +417,7 @@ TEST_F(KindsTest, WithoutAUrlThereIsNoRequest)
 {
     startWithoutBag();
     deliverBag("{}");
-    auto connection = client();
+    connection = client();
     const std::size_t before = tasks().size();
     for (Kind kind : kKinds) {
         SCOPED_TRACE(kind.className);
@@ -440,7 +427,7 @@ TEST_F(KindsTest, WithoutAUrlThereIsNoRequest)
         EXPECT_EQ(call->argument(2)["code"], Value(500));
         ASSERT_EQ(session->records.size(), 1u);
         EXPECT_EQ(session->records[0]->clientQueryId, 9u);
-        EXPECT_EQ(session->takeClasses(), Classes{"ZRErrorFeedback"});
+        EXPECT_EQ(session->takeClasses(), Strings{"ZRErrorFeedback"});
     }
     EXPECT_EQ(tasks().size(), before);
 }
@@ -479,7 +466,7 @@ TEST_F(KindsTest, AFailedBagFailsThem)
         EXPECT_EQ(notification.template get<platform::Error>("bagError").code, 2);
         ++failures;
     });
-    auto connection = client();
+    connection = client();
     respond("", 500);
     EXPECT_EQ(connection->takePushes().size(), 1u) << "the error, and nothing that waits for its second";
     for (const Kind& kind : kKinds) {

@@ -11,7 +11,6 @@
 namespace tavrin::test {
 namespace {
 
-using namespace std::chrono_literals;
 using platform::Error;
 
 using Task = platform::test::FakeUrlLoader::Task;
@@ -107,7 +106,7 @@ private:
     void step()
     {
         if (oneIn(8) && deliverBag()) return;
-        switch (upTo(19)) {
+        switch (const unsigned what = upTo(19)) {
         case 0: _test.device.advance(std::chrono::seconds(upTo(40))); break;
         case 1: {
             User& user = anyUser();
@@ -129,15 +128,11 @@ private:
             else
                 for (unsigned i = upTo(3); i < 4; ++i) key(anyUser());
             break;
-        case 4:
-        case 5:
-        case 6:
-        case 7:
-        case 8:
-        case 9:
-            if (auto task = anyTask()) respond(*task);
-            break;
-        default: key(anyUser());
+        default:
+            if (what > 9)
+                key(anyUser());
+            else if (auto task = anyTask())
+                respond(*task);
         }
     }
 
