@@ -15,7 +15,6 @@
 namespace tavrin {
 namespace {
 
-using namespace std::chrono_literals;
 using platform::ActivityState;
 using platform::AppActivity;
 using platform::test::LogCapture;
@@ -154,7 +153,6 @@ TEST_F(PeriodicTaskTest, NeedsANameAndAHandlerAndAPeriodOfFiveSeconds)
         EXPECT_EQ(made->periodSeconds(), c.period);
         EXPECT_EQ(made->executionCriteria().interval, c.interval);
     }
-    EXPECT_EQ(task->queue()->label(), "com.quorvane._DPPeriodicTasks.defaultQueue");
 }
 
 TEST_F(PeriodicTaskTest, RunsInATransactionWheneverItsActivityDoes)

@@ -3,16 +3,10 @@
 #include <unistd.h>
 
 #include "platform/values/Json.h"
-#include "tavrind/TAVNetworkRequestFactory.h"
 #include "tests/support/AssemblyFixture.h"
 
 namespace tavrin {
 namespace {
-
-using namespace std::chrono_literals;
-using platform::Dictionary;
-using platform::Url;
-using platform::Value;
 
 std::optional<Url> urlOf(std::string_view text)
 {
@@ -105,11 +99,6 @@ struct DownloadManagerTest : test::AssemblyTest {
     {
         tasks().back()->respond(status, std::move(contents), {}, std::move(from));
         device.drain();
-    }
-    std::string header(const platform::UrlRequest& request, std::string_view name)
-    {
-        const std::string* value = request.headers.find(name);
-        return value ? *value : "";
     }
     std::string contents(const std::string& identifier)
     {
@@ -299,10 +288,8 @@ TEST_F(DownloadManagerTest, AnUnknownResourceOfAnotherVersionIsLogged)
 TEST_F(DownloadManagerTest, LookupHintsFollowTheBagTheirRedirectAndTheLocation)
 {
     bag({});
-    device.location.moveTo(platform::fuzz(47.37, 8.54, "wifi"));
-    device.drain();
-    assembly.requestFactory->setPerformedSearch();
-    device.drain();
+    moveTo(platform::fuzz(47.37, 8.54, "wifi"));
+    performSearch();
 
     const std::string hints = "TAVLookupHintsWeekly";
     const auto first = download(hints, "https://r.example/hints?version=1");
@@ -343,11 +330,9 @@ TEST_F(DownloadManagerTest, LookupHintsFollowTheBagTheirRedirectAndTheLocation)
 
     watched = hints;
     told.clear();
-    device.location.moveTo(platform::fuzz(47.40, 8.56, "wifi")); // 4 km
-    device.drain();
+    moveTo(platform::fuzz(47.40, 8.56, "wifi")); // 4 km
     EXPECT_TRUE(manager->resourceForKey(hints));
-    device.location.moveTo(platform::fuzz(47.50, 8.72, "wifi"));
-    device.drain();
+    moveTo(platform::fuzz(47.50, 8.72, "wifi"));
     EXPECT_FALSE(manager->resourceForKey(hints));
     EXPECT_EQ(contents(hints), "x");
     EXPECT_EQ(told, std::vector<std::string>{"deleted"}) << "whoever uses the hints of another place stops";
@@ -364,8 +349,7 @@ TEST_F(DownloadManagerTest, OnlyLookupHintsAreAskedForWithTheLocation)
         all.set(std::string(identifier), "https://r.example/" + std::string(identifier));
     device.location.moveTo(platform::fuzz(47.37, 8.54, "wifi"));
     bag(std::move(all));
-    assembly.requestFactory->setPerformedSearch();
-    device.drain();
+    performSearch();
     device.advance(60s);
     ASSERT_EQ(tasks().size(), kTAVResourceIdentifiers.size());
     for (const auto& task : tasks()) {

@@ -2,14 +2,12 @@
 #include "platform/values/Json.h"
 #include "tavrind/AppWhitelistController.h"
 #include "tavrind/ClientSessionManager.h"
-#include "tavrind/TAVNetworkRequestFactory.h"
 #include "tavrind/TavrinUserGUIDController.h"
 #include "tests/support/AssemblyFixture.h"
 
 namespace tavrin {
 namespace {
 
-using platform::Url;
 using platform::UrlComponents;
 using platform::UrlRequest;
 
@@ -28,28 +26,23 @@ struct RequestFactoryTest : test::AssemblyTest {
                                   .geoMetadata = "meta",
                                   .geoEnvironment = "prod",
                                   .geoSessionId = "session-1"};
-        factory = TAVNetworkRequestFactory::make(assembly);
-        assembly.requestFactory = factory;
-        device.drain();
+        makeFactory();
     }
 
-    void move(std::optional<platform::Location> location)
+    void makeFactory()
     {
-        device.location.moveTo(std::move(location));
+        assembly.requestFactory = factory = TAVNetworkRequestFactory::make(assembly);
         device.drain();
     }
-    void performSearch()
-    {
-        factory->setPerformedSearch();
-        device.drain();
-    }
-    /// Gives the factory all that it may know.
+    /// Gives a factory all that it may know.
     void knowEverything()
     {
+        device.userDefaults.set("TAVDebugParameters", "debug=1");
+        makeFactory();
         announce(bag.rawBag());
-        move(kZurich);
+        moveTo(kZurich);
         factory->didUpdateStorefrontIdentifier("143459");
-        factory->didUpdateSubscriptionDictionaries({platform::Value::dictionaryOf({{"provider", "fuse"}})});
+        factory->didUpdateSubscriptionDictionaries({Value::dictionaryOf({{"provider", "fuse"}})});
         device.userDefaults.set("TAVAppWhitelistSignature", "c2lnbg==");
         assembly.appWhitelistController = std::make_shared<AppWhitelistController>(assembly);
         device.drain();
@@ -80,9 +73,6 @@ std::set<std::string> contents(const UrlRequest& request)
 
 TEST_F(RequestFactoryTest, APreviewSaysWhereEachPartComesFrom)
 {
-    device.userDefaults.set("TAVDebugParameters", "debug=1");
-    factory = TAVNetworkRequestFactory::make(assembly);
-    device.drain();
     knowEverything();
     bag = bagOf(R"({"searchURL": "https://s.example/search?tier=2&units=Metric"})");
     const auto search = TAVSearchRequest::searchRequestWithString("weat", StartSearchTrigger::Suggestion);
@@ -123,12 +113,7 @@ TEST_F(RequestFactoryTest, APreviewSaysWhereEachPartComesFrom)
 // applications of three kinds.
 TEST_F(RequestFactoryTest, EveryKindCarriesItsColumnOfTheTable)
 {
-    device.userDefaults.set("TAVDebugParameters", "debug=1");
-    factory = TAVNetworkRequestFactory::make(assembly);
-    assembly.requestFactory = factory;
-    device.drain();
     knowEverything();
-
     const auto controller = TavrinBagController::make(assembly);
     const auto search = TAVSearchRequest::searchRequestWithString("weat", StartSearchTrigger::Suggestion);
     TAVZeroKeywordRequest zeroKeyword;
@@ -140,7 +125,7 @@ TEST_F(RequestFactoryTest, EveryKindCarriesItsColumnOfTheTable)
          std::initializer_list<TAVRequest*>{search.get(), &zeroKeyword, &more, &lookup, &card, &flight}) {
         request->scale = 2;
         request->keyboardInputMode = "de_CH@sw";
-        request->topics = platform::Value::Array{"sports"};
+        request->topics = Value::Array{"sports"};
         request->queryItems = {std::make_shared<TAVQueryItem>("own", "1")};
     }
     more.moreResultsURL = card.cardURL = Url::parse("https://m.example/x");
@@ -312,8 +297,7 @@ TEST_F(RequestFactoryTest, WhatTheDeviceDoesNotHaveIsLeftOut)
                              .measurementSystem = "",
                              .region = ""};
     device.profile.current = {};
-    factory = TAVNetworkRequestFactory::make(assembly);
-    device.drain();
+    makeFactory();
     EXPECT_EQ(contents(*factory->searchRequest({.request = TAVSearchRequest(), .bag = &bag})),
               (std::set<std::string>{"card=1", "key=walrus7351", "locale=de_CH", "q=", "time_zone=Europe/Zurich"}));
 }
@@ -321,18 +305,18 @@ TEST_F(RequestFactoryTest, WhatTheDeviceDoesNotHaveIsLeftOut)
 TEST_F(RequestFactoryTest, OnlyAllowedSourcesTellThePlace)
 {
     const auto place = [&] { return factory->context().geoLocationLatLng + factory->context().geoLocationSource; };
-    move(kZurich);
+    moveTo(kZurich);
     EXPECT_EQ(place(), "") << "no bag has allowed a source";
     knowEverything();
     EXPECT_EQ(device.location.allowed, std::set<std::string>{"wifi"});
-    move(platform::Location{1, 2, "gps"});
+    moveTo(platform::Location{1, 2, "gps"});
     EXPECT_EQ(place(), "");
-    move(kZurich);
+    moveTo(kZurich);
     EXPECT_EQ(place(), "47.375000,8.545000wifi");
-    announce(platform::Dictionary{{"supportedGeoLocationSources", platform::Value::Array{"gps", "cell"}}});
+    announce(Dictionary{{"supportedGeoLocationSources", Value::Array{"gps", "cell"}}});
     EXPECT_EQ(device.location.allowed, (std::set<std::string>{"cell", "gps"}));
     EXPECT_EQ(place(), "") << "the bag has withdrawn the source";
-    move(kZurich);
+    moveTo(kZurich);
     EXPECT_EQ(place(), "") << "reported late";
 }
 
@@ -340,20 +324,19 @@ TEST_F(RequestFactoryTest, DownloadsTellThePlaceOfTheLastSearchUntilItIsLost)
 {
     announce(bag.rawBag());
     const auto place = [&](bool included) {
-        const auto request = factory->fileDownloadRequest(*Url::parse("https://r.example/"), "", included);
-        const std::string* header = request.headers.find("X-Quorvane-FuzzedLatLong");
-        return header ? *header : "";
+        return header(factory->fileDownloadRequest(*Url::parse("https://r.example/"), "", included),
+                      "X-Quorvane-FuzzedLatLong");
     };
     const std::tuple<const char*, std::function<void()>, const char*> steps[]{
         {"searched nowhere", [&] { performSearch(); }, ""},
-        {"came, but hasn't searched", [&] { move(kZurich); }, ""},
+        {"came, but hasn't searched", [&] { moveTo(kZurich); }, ""},
         {"searched", [&] { performSearch(); }, "47.375000,8.545000"},
-        {"moved on", [&] { move(platform::Location{46.205, 6.145, "wifi"}); }, "47.375000,8.545000"},
+        {"moved on", [&] { moveTo(platform::Location{46.205, 6.145, "wifi"}); }, "47.375000,8.545000"},
         {"searched there", [&] { performSearch(); }, "46.205000,6.145000"},
-        {"lost", [&] { move(std::nullopt); }, ""},
-        {"found", [&] { move(kZurich); }, ""},
+        {"lost", [&] { moveTo(std::nullopt); }, ""},
+        {"found", [&] { moveTo(kZurich); }, ""},
         {"searched again", [&] { performSearch(); }, "47.375000,8.545000"},
-        {"withdrawn by the bag", [&] { announce(platform::Dictionary()); }, ""},
+        {"withdrawn by the bag", [&] { announce(Dictionary()); }, ""},
     };
     for (const auto& [name, happens, told] : steps) {
         happens();
@@ -389,8 +372,7 @@ TEST_F(RequestFactoryTest, LanguagesThatCannotBeEncodedAreLeftOut)
     for (const auto& [language, header] : {std::pair("de-CH", R"(["de-CH","en"])"), {"d\xc3\xa9", ""}, {"d e", ""}}) {
         const platform::test::LogCapture lines;
         device.locale.context.preferredLanguages = {language, "en"};
-        device.locale.handler(platform::LocaleSource::Change::Locale);
-        device.drain();
+        changeLocale();
         EXPECT_EQ(factory->context().preferredLanguages, header) << language;
         EXPECT_EQ(lines.count("Error encoding preferred languages"), *header ? 0 : 1) << language;
     }
@@ -409,8 +391,7 @@ TEST_F(RequestFactoryTest, TheDevicesCountrySaysWhereTheBagIs)
     const TavrinBagController controller(assembly);
     const auto host = [&] { return factory->bagFetchRequest(controller, "tavrind/1", "").url.host(); };
     EXPECT_EQ(host(), "bag.quorvane.example");
-    device.profile.change({.countryCode = "CN"});
-    device.drain();
+    changeProfile({.countryCode = "CN"});
     EXPECT_EQ(host(), "bag-cn.quorvane.example");
     EXPECT_EQ(factory->bagCacheRequest(controller, "tavrind/1", "").url.host(), "bag-cn.quorvane.example");
 }
@@ -422,18 +403,14 @@ TEST_F(RequestFactoryTest, ChangesThatConcernTheBagAreTold)
     device.drain();
     EXPECT_EQ(told, 0) << "not for the first computation";
 
-    device.profile.change({.storefront = "1"}); // the country stays the locale's
-    device.drain();
+    changeProfile({.storefront = "1"}); // the country stays the locale's
     EXPECT_EQ(told, 0);
-    device.profile.change({.countryCode = "CN"});
-    device.drain();
+    changeProfile({.countryCode = "CN"});
     EXPECT_EQ(told, 1);
-    device.locale.handler(platform::LocaleSource::Change::TimeZone);
-    device.drain();
+    changeLocale(platform::LocaleSource::Change::TimeZone);
     EXPECT_EQ(told, 1);
     device.locale.context.identifier = "fr_CH";
-    device.locale.handler(platform::LocaleSource::Change::Locale);
-    device.drain();
+    changeLocale();
     EXPECT_EQ(told, 2);
     EXPECT_EQ(factory->context().localeIdentifier, "fr_CH");
 }
@@ -441,9 +418,8 @@ TEST_F(RequestFactoryTest, ChangesThatConcernTheBagAreTold)
 TEST_F(RequestFactoryTest, MalformedDebugParametersAreLoggedAndLeftOut)
 {
     device.userDefaults.set("TAVDebugParameters", "a=1&b&=c&d=&e=f=g&&h=2");
-    const auto debugged = TAVNetworkRequestFactory::make(assembly);
-    device.drain();
-    EXPECT_EQ(debugged->context().debuggingQueryItems,
+    makeFactory();
+    EXPECT_EQ(factory->context().debuggingQueryItems,
               (std::vector<platform::QueryItem>{{"a", "1"}, {"d", ""}, {"h", "2"}}));
     EXPECT_EQ(log.count("invalid query components: "), 4);
 }

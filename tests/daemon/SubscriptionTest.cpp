@@ -1,15 +1,10 @@
 #include "platform/values/Json.h"
-#include "tavrind/TAVNetworkRequestFactory.h"
 #include "tavrind/TavrinSubscriptionInfo.h"
 #include "tavrind/TavrinSubscriptionManager.h"
 #include "tests/support/AssemblyFixture.h"
 
 namespace tavrin {
 namespace {
-
-using namespace std::chrono_literals;
-using platform::Dictionary;
-using platform::Value;
 
 TEST(SubscriptionInfo, ReadsPairsOrRefusesTheWholeText)
 {
@@ -82,6 +77,11 @@ struct SubscriptionManagerTest : test::AssemblyTest {
         manager = TavrinSubscriptionManager::make(assembly, factory);
         device.drain();
     }
+    void changeProviders()
+    {
+        device.subscriptions.handler();
+        device.drain();
+    }
     std::string header() { return factory->context().subscriptionInfo; }
 
     static constexpr const char* kFuseOnly = R"([{"provider":"fuse","attribute":"premium","active":false}])";
@@ -95,8 +95,7 @@ struct SubscriptionManagerTest : test::AssemblyTest {
 TEST_F(SubscriptionManagerTest, TheHeaderFollowsTheBagTheProvidersAndTheProfile)
 {
     EXPECT_EQ(header(), "") << "no bag yet";
-    device.subscriptions.handler();
-    device.drain();
+    changeProviders();
     EXPECT_EQ(header(), "");
 
     announce(lists);
@@ -105,12 +104,10 @@ TEST_F(SubscriptionManagerTest, TheHeaderFollowsTheBagTheProvidersAndTheProfile)
     EXPECT_EQ(device.subscriptions.asked.domains, std::vector<std::string>{"d.example"});
     EXPECT_EQ(device.subscriptions.asked.maximumExpiration, 60s);
 
-    device.subscriptions.services = {{"daily", Value::dictionaryOf({{"provider", "dai\x7fly"}})},
-                                     {"fuse", Value::dictionaryOf({{"provider", "an impostor"}})}};
-    device.subscriptions.handler();
-    device.drain();
-    device.profile.change({.storefront = "143441", .newsSubscribed = true});
-    device.drain();
+    device.subscriptions.services = {{"daily", Dictionary{{"provider", "dai\x7fly"}}},
+                                     {"fuse", Dictionary{{"provider", "an impostor"}}}};
+    changeProviders();
+    changeProfile({.storefront = "143441", .newsSubscribed = true});
     EXPECT_EQ(header(), R"([{"provider":"fuse","attribute":"premium","active":true},{"provider":"dai\u007fly"}])");
     EXPECT_EQ(manager->subscriptions().size(), 2u);
     EXPECT_EQ(factory->context().storeFrontIdentifier, "143441");
@@ -127,8 +124,7 @@ TEST_F(SubscriptionManagerTest, AFailureOfTheProvidersLeavesTheMakersOwn)
     announce(lists);
     EXPECT_NE(header(), kFuseOnly);
     device.subscriptions.services = std::unexpected(platform::Error::posix(EIO));
-    device.subscriptions.handler();
-    device.drain();
+    changeProviders();
     EXPECT_EQ(header(), kFuseOnly);
     EXPECT_EQ(log.count("Error fetching third party subscription information from daemon: "), 1);
     device.notifications.post({.name = TAVBagChangeNotification, .userInfo = {{"bagError", platform::Error()}}});
@@ -149,8 +145,7 @@ TEST_F(SubscriptionManagerTest, TheHeaderHoldsWholeSubscriptionsUpToItsLimit)
     EXPECT_EQ(log.count("subscription with"), 0);
     device.subscriptions.services = {
         {"a", subscription("a", 4090)}, {"b", subscription("b", 3000)}, {"c", subscription("c", 1)}};
-    device.subscriptions.handler();
-    device.drain();
+    changeProviders();
     EXPECT_EQ(log.count("subscription with \"a\" is not sent"), 1);
     const auto sent = platform::parseJson(header()).value_or(Value());
     EXPECT_EQ(sent.count(), 3u);
