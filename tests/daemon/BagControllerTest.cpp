@@ -4,7 +4,6 @@
 #include "platform/values/PropertyList.h"
 #include "tavrind/ClientSessionManager.h"
 #include "tavrind/TAVNetworkRequestFactory.h"
-#include "tavrind/TavrinBagController.h"
 #include "tests/support/FeedbackFixture.h"
 
 namespace tavrin::test {

@@ -16,12 +16,9 @@
 namespace tavrin::test {
 namespace {
 
-using namespace std::chrono_literals;
 using platform::JsonView;
 using platform::LogLevel;
 using platform::Url;
-using platform::test::LogCapture;
-using Strings = std::vector<std::string>;
 
 Value image(const std::string& url)
 {
@@ -90,12 +87,12 @@ TEST(ResponseImages, AreOrderedByWhatIsKnownOfThem)
     std::set<std::string> seen;
     OrderedImages images;
     const auto all = json(R"([
-        {"url": "https://A.example/1", "id": "one"}, {"id": "a b"}, {"url": "https://A.example/1"}, "text", 7, null,
+        {"url": "https://A.example/1", "id": "one"}, {"id": "a/ü b"}, {"url": "https://A.example/1"}, "text", 7, null,
         {"url": "not a url", "id": "two"}, {"url": "mailto:x@y.example"}, {"url": "file:///etc/passwd"},
         {"url": "ftp://f.example/x"}, {"id": 4, "url": ["x"]}, {"id": "one"}, {}])");
     for (const JsonView each : all.root().elements()) collectOrderedImages(bag, each.value(), &seen, images);
     EXPECT_EQ(textsOf(images.primary),
-              (Strings{"https://A.example/1", "https://i.example/a%20b", "ftp://f.example/x"}));
+              (Strings{"https://A.example/1", "https://i.example/a%2F%C3%BC%20b", "ftp://f.example/x"}));
     EXPECT_EQ(textsOf(images.secondary), (Strings{"https://i.example/one", "https://i.example/two"}));
     EXPECT_EQ(images.hosts, (std::set<std::string>{"a.example", "f.example", "i.example"}));
 
@@ -188,13 +185,11 @@ TEST_F(ImageFetchesTest, AFullLaneTakesNoMore)
 // ---- The daemon
 
 struct ImageLoadingTest : DaemonTest {
-    static constexpr const char* kImageBag = R"({"version": "9", "searchURL": "https://s.example/search",
-        "imageURL": "https://i.example/{id}", "timeoutIntervalForRequest": 7})";
-
     ImageLoadingTest()
     {
         start();
-        deliverBag(kImageBag);
+        deliverBag(R"({"version": "9", "searchURL": "https://s.example/search", "timeoutIntervalForRequest": 7,
+                       "imageURL": "https://i.example/{id}"})");
         connection = client();
         endpoint = device.ipc.connect("com.quorvane.TAVEndpointXPC");
         device.drain();
@@ -343,10 +338,7 @@ TEST_F(ImageLoadingTest, ImagesLeadNoFurtherThanRedirectsOfTheirAnswer)
 TEST_F(ImageLoadingTest, AClientMayDoWithoutThem)
 {
     connection = connect(78);
-    connection->call("Configure", {Dictionary{{"class", "TAVSessionConfiguration"},
-                                              {"identifier", "com.quorvane.news"},
-                                              {"userAgent", "News/1"},
-                                              {"dontPreloadImages", true}}});
+    configure(*connection, "com.quorvane.news", "News/1", {{"dontPreloadImages", true}});
     answerSearch(Value::Array{image("https://a.example/1")});
     EXPECT_TRUE(fetches().empty());
 }
@@ -461,9 +453,7 @@ TEST_F(ImageLoadingTest, EveryFailureIsToldAndTheNextImageIsFetched)
     for (const auto& c : cases) {
         SCOPED_TRACE(c.name);
         LogCapture log;
-        device.files.fault = [&c](std::string_view operation, const auto&) {
-            return operation == "temporary" && !c.disk ? EMFILE : 0;
-        };
+        if (!c.disk) failOn("temporary", EMFILE);
         auto call = load({image(fmt::format("https://a.example/{}", number++))});
         session->records.clear();
         c.answer(*fetches().at(0));

@@ -46,18 +46,10 @@ TEST(RequestBuilder, ForcedItemsWinOverDefaults)
 
 TEST(RequestBuilder, EncodesWhatAServerWouldMisread)
 {
-    const std::pair<const char*, const char*> cases[]{{"a;b", "a%3Bb"},
-                                                      {"c++", "c%2B%2B"},
-                                                      {"a&b=c#d", "a%26b%3Dc%23d"},
-                                                      {"ü 日", "%C3%BC%20%E6%97%A5"},
-                                                      {"/?:@!$'()*,-._~", "/?:@!$'()*,-._~"},
-                                                      {"100%", "100%25"},
-                                                      {"\"<>[]^`{|}", "%22%3C%3E%5B%5D%5E%60%7B%7C%7D"}};
-    for (const auto& [text, encoded] : cases) {
-        Builder builder = builderFor("https://s.example/");
-        builder.forceQueryItemWithName("q", text);
-        EXPECT_EQ(urlOf(builder), std::string("https://s.example/?q=") + encoded);
-    }
+    Builder builder = builderFor("https://s.example/");
+    builder.forceQueryItemWithName("q", "a&b=c#d;e+f 100% /?:@!$'()*,-._~ \"<>[]^`{|}日");
+    EXPECT_EQ(urlOf(builder), "https://s.example/?q=a%26b%3Dc%23d%3Be%2Bf%20100%25%20/?:@!$'()*,-._~%20"
+                              "%22%3C%3E%5B%5D%5E%60%7B%7C%7D%E6%97%A5");
     EXPECT_EQ(urlOf(builderFor("https://s.example/?q=a+b;c&r=%2B%7e")), "https://s.example/?q=a+b%3Bc&r=%2B%7e")
         << "what the service encoded stays as it is";
 }

@@ -236,11 +236,11 @@ TEST_F(RequestFactoryTest, TheEndpointsOwnItemsAndTheQuerysItemsWin)
     EXPECT_FALSE(request->timeout) << "left to the session";
     EXPECT_FALSE(request->headers.find("X-Quorvane-GeoEnvironment"));
 
-    bag = bagOf(R"({"searchURL": "https://s.example/", "timeoutIntervalForRequest": 7})");
+    bag = bagOf(R"({"searchURL": "https://s.example/", "timeoutIntervalForRequest": 7.5})");
     ClientRequest client = of(search);
-    EXPECT_EQ(factory->searchRequest(client)->timeout, std::chrono::seconds(7));
-    client.timeout = std::chrono::seconds(2);
-    EXPECT_EQ(factory->searchRequest(client)->timeout, std::chrono::seconds(2));
+    EXPECT_EQ(factory->searchRequest(client)->timeout, 7500ms);
+    client.timeout = 2s;
+    EXPECT_EQ(factory->searchRequest(client)->timeout, 2s);
 }
 
 TEST_F(RequestFactoryTest, TheTriggerSaysWhetherTheQueryIsASuggestion)
@@ -313,7 +313,7 @@ TEST_F(RequestFactoryTest, OnlyAllowedSourcesTellThePlace)
     EXPECT_EQ(place(), "");
     moveTo(kZurich);
     EXPECT_EQ(place(), "47.375000,8.545000wifi");
-    announce(Dictionary{{"supportedGeoLocationSources", Value::Array{"gps", "cell"}}});
+    announce(Dictionary{{"supportedGeoLocationSources", Value::Array{"gps", 4, "cell"}}});
     EXPECT_EQ(device.location.allowed, (std::set<std::string>{"cell", "gps"}));
     EXPECT_EQ(place(), "") << "the bag has withdrawn the source";
     moveTo(kZurich);

@@ -33,93 +33,53 @@ struct SessionTest : FeedbackTest {
 
 TEST_F(SessionTest, SessionsEndAtTheirLimits)
 {
-    struct Case {
+    using enum SessionState;
+    using Steps = std::vector<std::pair<std::chrono::seconds, const char*>>;
+    constexpr const char *kOther = "ZRClearInputFeedback", *kEngaged = "ZRResultEngagementFeedback";
+    const struct {
         const char* what;
-        std::function<void()> happens; ///< after one event
+        Steps steps; ///< after one event: time, then an event
         const char* endReason;
-        Strings events;
-        bool rolls = true; ///< another GUID follows
-    };
-    const auto events = [](Strings types) {
-        types.insert(types.begin(), "search_view_appear");
-        types.emplace_back("session_end");
-        return types;
-    };
-    const Case cases[] = {
-        {"asked to end", [this] { flushSession(); }, "external request", events({}), false},
-        {"15 minutes", [this] { device.advance(900s); }, "max session time passed", events({})},
-        {"events keep it busy beyond 10 minutes, not beyond 15",
-         [this] {
-             for (int i = 0; i < 8; ++i) {
-                 device.advance(119s);
-                 report("ZRClearInputFeedback");
-             }
-         },
-         "max session time passed", events(Strings(7, "clear_input"))},
-        {"an engagement behind 10 minutes",
-         [this] {
-             device.advance(601s);
-             report("ZRResultEngagementFeedback");
-             EXPECT_EQ(state(), SessionState::None);
-         },
-         "engagement received", events({"result_engagement"})},
-        {"a card's engagement, too",
-         [this] {
-             device.advance(601s);
-             report("ZRCardSectionEngagementFeedback");
-         },
-         "engagement received", events({"card_engagement"})},
-        {"3 idle minutes behind 10",
-         [this] {
-             device.advance(599s);
-             report("ZRClearInputFeedback");
-             device.advance(180s);
-             report("ZRDidGoToSiteFeedback");
-             EXPECT_EQ(state(), SessionState::Open) << "the event at hand begins the next";
-         },
-         "session idle", events({"clear_input"})},
-        {"3 idle minutes alone don't end it",
-         [this] {
-             device.advance(300s);
-             report("ZRClearInputFeedback");
-             flushSession();
-         },
-         "external request", events({"clear_input"}), false},
-        {"an engagement alone doesn't either",
-         [this] {
-             report("ZRResultEngagementFeedback");
-             flushSession();
-         },
-         "external request", events({"result_engagement"}), false},
-        {"critical memory is not listened to, another GUID is",
-         [this] {
-             assembly().guidController->reset();
-             device.drain();
-             report("ZRClearInputFeedback");
-         },
-         "guid changed", events({})},
-        {"another GUID counts before an engagement behind 10 minutes",
-         [this] {
-             device.advance(601s);
-             assembly().guidController->reset();
-             device.drain();
-             report("ZRResultEngagementFeedback");
-             EXPECT_EQ(state(), SessionState::Open);
-         },
-         "guid changed", events({})},
+        Strings events;                           ///< between the first one and the session's end
+        bool rolls = true;                        ///< another GUID follows
+        std::optional<SessionState> stateAtEnd{}; ///< of the steps
+        bool resets = false;                      ///< the GUID, before the event
+    } cases[]{
+        {"asked to end", {}, "external request", {}, false},
+        {"15 minutes", {{900s, nullptr}}, "max session time passed", {}},
+        {"busy beyond 10 minutes, not beyond 15", Steps(8, {119s, kOther}), "max session time passed",
+         Strings(7, "clear_input")},
+        {"engaged behind 10 minutes", {{601s, kEngaged}}, "engagement received", {"result_engagement"}, true, None},
+        {"a card's, too", {{601s, "ZRCardSectionEngagementFeedback"}}, "engagement received", {"card_engagement"}},
+        {"3 idle minutes behind 10", {{599s, kOther}, {180s, kOther}}, "session idle", {"clear_input"}, true, Open},
+        {"3 idle minutes alone don't end it", {{300s, kOther}}, "external request", {"clear_input"}, false},
+        {"an engagement alone doesn't", {{0s, kEngaged}}, "external request", {"result_engagement"}, false},
+        {"another GUID", {{0s, kOther}}, "guid changed", {}, true, {}, true},
+        {"another GUID counts before an engagement", {{601s, kEngaged}}, "guid changed", {}, true, Open, true},
     };
     std::string previous = "no previous session";
-    for (const Case& each : cases) {
+    for (const auto& each : cases) {
+        SCOPED_TRACE(each.what);
         const std::size_t before = sessions().size();
         appear();
-        EXPECT_EQ(state(), SessionState::Open) << each.what;
-        const platform::Uuid guid = assembly().guidController->currentUserGUID();
-        each.happens();
-        EXPECT_EQ(assembly().guidController->currentUserGUID() != guid, each.rolls) << each.what;
+        EXPECT_EQ(state(), SessionState::Open);
+        auto& guids = *assembly().guidController;
+        const platform::Uuid guid = guids.currentUserGUID();
+        for (const auto& [time, event] : each.steps) {
+            device.advance(time);
+            if (each.resets) guids.reset();
+            device.drain();
+            if (event) report(event);
+        }
+        EXPECT_EQ(state(), each.stateAtEnd.value_or(state()));
         const Value session = sessions().at(before);
-        EXPECT_EQ(typesIn(session), each.events) << each.what;
-        EXPECT_EQ(reason(session), each.endReason) << each.what;
-        EXPECT_EQ(session["previous_session_end_reason"], Value(previous)) << each.what;
+        EXPECT_EQ(guids.currentUserGUID() != guid, each.rolls);
+        Strings types{"search_view_appear"};
+        types.insert(types.end(), each.events.begin(), each.events.end());
+        types.emplace_back("session_end");
+        EXPECT_EQ(typesIn(session), types);
+        EXPECT_EQ(reason(session), each.endReason);
+        EXPECT_EQ(session["previous_session_end_reason"], Value(previous));
         previous = sessions().size() == before + 1 ? each.endReason : "external request";
         device.advance(1h);
     }

@@ -14,21 +14,8 @@ TAVBag bagOf(std::string_view json, std::string userAgent = "Vistrel/4")
     return TAVBag(platform::parseJson(json).value(), std::move(userAgent));
 }
 
-TEST(TAVBag, ReadsItsKeysAndFallsBackToDefaults)
+TEST(TAVBag, FallsBackToDefaults)
 {
-    const TAVBag bag =
-        bagOf(R"({"version": 12, "isEnabled": false, "minimumQueryLength": 3, "searchURL": "https://s.example/q",
-        "timeoutIntervalForRequest": 2.5, "imageURL": "https://i.example/{id}.png", "supportedGeoLocationSources": ["gps", 4],
-        "TAVQIFeatures": "https://r.example/f"})");
-    EXPECT_EQ(bag.version(), "12");
-    EXPECT_FALSE(bag.isEnabled());
-    EXPECT_EQ(bag.minimumQueryLength(), 3u);
-    EXPECT_EQ(bag.searchURL()->string(), "https://s.example/q");
-    EXPECT_EQ(bag.timeoutIntervalForRequest(), 2.5);
-    EXPECT_EQ(bag.urlForIdentifier("a/ü")->string(), "https://i.example/a%2F%C3%BC.png");
-    EXPECT_EQ(bag.supportedGeoLocationSources(), std::vector<std::string>{"gps"});
-    EXPECT_EQ(bag.resourceURL("TAVQIFeatures")->string(), "https://r.example/f");
-
     for (const char* empty : {"{}", "[]", "7"}) {
         const TAVBag none = bagOf(empty);
         EXPECT_TRUE(none.isEnabled() && none.feedbackEnabled());

@@ -4,14 +4,11 @@
 #include <random>
 
 #include "platform/text/Text.h"
-#include "platform/values/Dictionary.h"
 #include "platform/values/Json.h"
 #include "tests/support/DaemonFixture.h"
 
 namespace tavrin::test {
 namespace {
-
-using platform::Error;
 
 using Task = platform::test::FakeUrlLoader::Task;
 
@@ -20,13 +17,6 @@ std::optional<std::string> searchedFor(const Task& task)
 {
     const platform::Url& url = task.originalRequest().url;
     return url.string().starts_with("https://s.example/search") ? url.queryValue("q") : std::nullopt;
-}
-
-/// The result sets of an answer with a reply; null for one without.
-Value setsIn(FakeCall& call)
-{
-    const Value raw = call.argument(1)["rawResponse"];
-    return raw.asBytes() ? platform::parseJson(raw.asBytes()->view()).value_or(Value()) : Value();
 }
 
 using TypingTest = DaemonTest;
@@ -168,7 +158,7 @@ private:
         const std::string text = *searchedFor(task);
         const platform::Date now = _test.device.clock.wallNow();
         switch (upTo(11)) {
-        case 0: return task.fail(Error::withReason("x", 1, "the network is gone"));
+        case 0: return task.fail(platform::Error::withReason("x", 1, "the network is gone"));
         case 1: return task.cancel();
         case 2: return task.respond(200, "no JSON");
         case 3: return task.finish(platform::Bytes("[]"), std::nullopt, std::nullopt);
@@ -198,7 +188,8 @@ private:
                 EXPECT_EQ(call.call->argument(0), Value(call.id));
                 if (reply.count() == 0) continue;
                 EXPECT_TRUE(call.newest) << call.text << " was no news when it came, and got an answer";
-                const Value sets = setsIn(*call.call);
+                const platform::Bytes* raw = reply["rawResponse"].asBytes();
+                const Value sets = raw ? platform::parseJson(raw->view()).value_or(Value()) : Value();
                 if (reply["httpResponse"].count() == 0) {
                     judgeFromCache(call, reply, sets[0]);
                     continue;

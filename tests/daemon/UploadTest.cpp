@@ -327,28 +327,23 @@ TEST_F(UploadTest, StatesOfTheActivity)
 
 TEST_F(UploadTest, FaultsOfTheDiskLoseOneSessionAndNothingElse)
 {
-    struct Case {
-        const char* operation;
-        const char* path; ///< part of it
-        FeedbackFate fate;
-    };
-    for (const Case& each : {Case{"create", "session.", FeedbackFate::NoContainer},
-                             {"append", "session.", FeedbackFate::NoContainer},
-                             {"create", "flusher_", FeedbackFate::NoBody},
-                             {"append", "flusher_", FeedbackFate::NoBody},
-                             {"mkdir", "com.quorvane.tavrind", FeedbackFate::NoContainer},
-                             {"write", ".body", FeedbackFate::NoTask},
-                             {"info", "session.", FeedbackFate::Unreadable},
-                             {"read", "session.", FeedbackFate::Unreadable}}) {
-        SCOPED_TRACE(std::string(each.operation) + " " + each.path);
+    for (const auto& [operation, path, fate] : {std::tuple("create", "session.", FeedbackFate::NoContainer),
+                                                {"append", "session.", FeedbackFate::NoContainer},
+                                                {"create", "flusher_", FeedbackFate::NoBody},
+                                                {"append", "flusher_", FeedbackFate::NoBody},
+                                                {"mkdir", "com.quorvane.tavrind", FeedbackFate::NoContainer},
+                                                {"write", ".body", FeedbackFate::NoTask},
+                                                {"info", "session.", FeedbackFate::Unreadable},
+                                                {"read", "session.", FeedbackFate::Unreadable}}) {
+        SCOPED_TRACE(std::string(operation) + " " + path);
         begin();
-        const std::int64_t before = booked(each.fate);
-        failOn(each.operation, ENOSPC, each.path);
+        const std::int64_t before = booked(fate);
+        failOn(operation, ENOSPC, path);
         closeSession();
         upload();
         device.files.fault = {};
         EXPECT_TRUE(uploads().empty() && sessionFiles().empty());
-        EXPECT_EQ(booked(each.fate) - before, 2);
+        EXPECT_EQ(booked(fate) - before, 2);
         EXPECT_EQ(typesIn(decoded(*uploadOne())), (Strings{"search_view_appear", "session_end"}));
         EXPECT_EQ(uploads().size(), 1u);
         expectBooksClose();

@@ -4,23 +4,12 @@
 
 namespace tavrin::test {
 
-RecordingSessionManager::RecordingSessionManager(Assembly& assembly)
-    : ClientSessionManager(assembly, assembly.guidController, "test")
-{}
-
-void RecordingSessionManager::addTavrinFeedback(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void>)
-{
-    records.push_back(std::move(feedback));
-}
-
 Strings RecordingSessionManager::takeClasses()
 {
     Strings classes;
     for (const auto& record : std::exchange(records, {})) classes.emplace_back(record->feedback()->className());
     return classes;
 }
-
-DaemonTest::DaemonTest(platform::FileSystem* disk, std::filesystem::path root) : device(disk, std::move(root)) {}
 
 DaemonTest::~DaemonTest()
 {
@@ -57,11 +46,6 @@ void DaemonTest::startWithoutBag()
     start();
 }
 
-std::vector<std::shared_ptr<platform::test::FakeUrlLoader::Task>>& DaemonTest::tasks()
-{
-    return device.loader.sessions.at(0)->tasks;
-}
-
 void DaemonTest::respond(std::string body, int status, platform::HttpHeaders headers)
 {
     lastTask()->respond(status, std::move(body), std::move(headers));
@@ -89,11 +73,13 @@ std::shared_ptr<FakeConnection> DaemonTest::client(std::string identifier, std::
     return connection;
 }
 
-std::shared_ptr<FakeCall> DaemonTest::configure(FakeConnection& connection, std::string identifier, std::string agent)
+std::shared_ptr<FakeCall> DaemonTest::configure(FakeConnection& connection, std::string identifier, std::string agent,
+                                                Dictionary fields)
 {
-    auto call = connection.call("Configure", {Value::dictionaryOf({{"class", "TAVSessionConfiguration"},
-                                                                   {"identifier", std::move(identifier)},
-                                                                   {"userAgent", std::move(agent)}})});
+    fields.set("class", "TAVSessionConfiguration");
+    fields.set("identifier", std::move(identifier));
+    fields.set("userAgent", std::move(agent));
+    auto call = connection.call("Configure", {std::move(fields)});
     device.drain();
     return call;
 }
@@ -130,11 +116,6 @@ std::shared_ptr<FakeCall> DaemonTest::search(FakeConnection& connection, std::in
 {
     fields.set("queryString", std::move(query));
     return request(connection, "TAVSearchRequest", queryId, std::move(fields));
-}
-
-std::int64_t DaemonTest::counter(std::string_view name)
-{
-    return device.counters.value("com.quorvane.tavrind." + std::string(name));
 }
 
 void DaemonTest::failOn(std::string operation, int error, std::string part)

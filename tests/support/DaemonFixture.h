@@ -24,8 +24,13 @@ using Strings = std::vector<std::string>;
 /// Keeps what the daemon records, in order.
 class RecordingSessionManager final : public ClientSessionManager {
 public:
-    explicit RecordingSessionManager(Assembly& assembly);
-    void addTavrinFeedback(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void>) override;
+    explicit RecordingSessionManager(Assembly& assembly)
+        : ClientSessionManager(assembly, assembly.guidController, "test")
+    {}
+    void addTavrinFeedback(std::shared_ptr<TavrinFeedback> feedback, std::shared_ptr<void>) override
+    {
+        records.push_back(std::move(feedback));
+    }
     /// The classes of the records so far, taken out.
     Strings takeClasses();
     template <class T> std::shared_ptr<T> last() const
@@ -39,7 +44,9 @@ public:
 /// The whole daemon on a device of twins: the test is the clients, the service and the clock.
 struct DaemonTest : testing::Test {
     /// On the twin's files, or in a directory of another file system.
-    explicit DaemonTest(platform::FileSystem* disk = nullptr, std::filesystem::path root = "/");
+    explicit DaemonTest(platform::FileSystem* disk = nullptr, std::filesystem::path root = "/")
+        : device(disk, std::move(root))
+    {}
     ~DaemonTest() override;
 
     /// Lets everything under way end.
@@ -51,7 +58,7 @@ struct DaemonTest : testing::Test {
     Assembly& assembly() { return daemon->assembly; }
 
     /// Requests of the foreground session, in order; the first is the bag's.
-    std::vector<std::shared_ptr<platform::test::FakeUrlLoader::Task>>& tasks();
+    auto& tasks() { return device.loader.sessions.at(0)->tasks; }
     auto lastTask() { return tasks().back(); }
     void respond(std::string body, int status = 200, platform::HttpHeaders headers = {});
     /// Answers the bag request that is under way.
@@ -63,7 +70,8 @@ struct DaemonTest : testing::Test {
     /// A client that has configured.
     std::shared_ptr<FakeConnection> client(std::string identifier = "com.quorvane.vistrel",
                                            std::string agent = "Vistrel/4", pid_t pid = 77);
-    std::shared_ptr<FakeCall> configure(FakeConnection& connection, std::string identifier, std::string agent);
+    std::shared_ptr<FakeCall> configure(FakeConnection& connection, std::string identifier, std::string agent,
+                                        Dictionary fields = {});
     /// The client goes away.
     void end(FakeConnection& connection);
     std::shared_ptr<FakeCall> report(FakeConnection& connection, std::string className, Dictionary fields = {},
@@ -72,7 +80,7 @@ struct DaemonTest : testing::Test {
                                       Dictionary fields = {});
     std::shared_ptr<FakeCall> search(FakeConnection& connection, std::int64_t queryId, std::string query,
                                      Dictionary fields = {});
-    std::int64_t counter(std::string_view name);
+    std::int64_t counter(const std::string& name) { return device.counters.value("com.quorvane.tavrind." + name); }
     /// From here on, an operation on files whose path contains `part` fails.
     void failOn(std::string operation, int error, std::string part = "");
 

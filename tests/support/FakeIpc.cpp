@@ -89,27 +89,12 @@ std::shared_ptr<FakeCall> FakeConnection::call(std::string_view member, ipc::Mes
     return call;
 }
 
-void FakeConnection::end()
-{
-    finish(false);
-}
-
-void FakeConnection::invalidate()
-{
-    finish(true);
-}
-
 void FakeConnection::finish(bool dropQueuedCalls)
 {
     if (dropQueuedCalls) *_dropCalls = true;
     if (std::exchange(_invalidated, true)) return;
     _handler.reset();
     if (_invalidationHandler) _queue->async(std::exchange(_invalidationHandler, {}));
-}
-
-std::vector<FakePush> FakeConnection::takePushes()
-{
-    return std::exchange(_pushes, {});
 }
 
 void FakeConnection::exportObject(ipc::Handler handler)
@@ -122,16 +107,6 @@ void FakeConnection::setInvalidationHandler(std::move_only_function<void()> hand
 {
     EXPECT_FALSE(_resumed) << "setInvalidationHandler after resume";
     _invalidationHandler = std::move(handler);
-}
-
-void FakeConnection::setPushErrorHandler(std::function<void(const std::string&)> handler)
-{
-    _pushErrorHandler = std::move(handler);
-}
-
-void FakeConnection::resume()
-{
-    _resumed = true;
 }
 
 void FakeConnection::push(std::string_view signal, ipc::Message arguments)
@@ -170,7 +145,7 @@ private:
     const std::shared_ptr<Endpoint> _endpoint;
 };
 
-std::unique_ptr<ipc::Listener> FakeTransport::make(const ipc::Interface& interface, const std::string& label)
+std::unique_ptr<ipc::Listener> FakeTransport::anonymous(const ipc::Interface& interface, const std::string& label)
 {
     auto address = "unix:path=/fake/" + std::to_string(_endpoints.size());
     auto endpoint = std::make_shared<Endpoint>(interface, label, std::move(address));
@@ -200,16 +175,6 @@ void FakeTransport::endAll()
 {
     for (const auto& connection : std::exchange(_connections, {}))
         if (const auto living = connection.lock()) living->end();
-}
-
-Result<std::unique_ptr<ipc::Listener>> FakeTransport::listen(const ipc::Interface& interface, const std::string& label)
-{
-    return make(interface, label);
-}
-
-std::unique_ptr<ipc::Listener> FakeTransport::anonymous(const ipc::Interface& interface, const std::string& label)
-{
-    return make(interface, label);
 }
 
 } // namespace platform::test

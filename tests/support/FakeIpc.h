@@ -47,9 +47,9 @@ public:
     std::shared_ptr<FakeCall> call(std::string_view member, std::vector<Value> args = {});
     std::shared_ptr<FakeCall> call(std::string_view member, ipc::Message arguments);
     /// The peer goes away.
-    void end();
+    void end() { finish(false); }
     /// What was pushed so far, in order; it is taken out.
-    [[nodiscard]] std::vector<FakePush> takePushes();
+    [[nodiscard]] std::vector<FakePush> takePushes() { return std::exchange(_pushes, {}); }
     [[nodiscard]] bool resumed() const { return _resumed; }
     /// True once either side has ended the connection.
     [[nodiscard]] bool invalidated() const { return _invalidated; }
@@ -59,10 +59,13 @@ public:
     [[nodiscard]] const std::shared_ptr<Queue>& queue() const override { return _queue; }
     void exportObject(ipc::Handler handler) override;
     void setInvalidationHandler(std::move_only_function<void()> handler) override;
-    void setPushErrorHandler(std::function<void(const std::string&)> handler) override;
-    void resume() override;
+    void setPushErrorHandler(std::function<void(const std::string&)> handler) override
+    {
+        _pushErrorHandler = std::move(handler);
+    }
+    void resume() override { _resumed = true; }
     void push(std::string_view signal, ipc::Message arguments) override;
-    void invalidate() override;
+    void invalidate() override { finish(true); }
 
 private:
     void finish(bool dropQueuedCalls);
@@ -91,14 +94,16 @@ public:
     void endAll();
 
     [[nodiscard]] Result<std::unique_ptr<ipc::Listener>> listen(const ipc::Interface& interface,
-                                                                const std::string& label) override;
+                                                                const std::string& label) override
+    {
+        return anonymous(interface, label);
+    }
     [[nodiscard]] std::unique_ptr<ipc::Listener> anonymous(const ipc::Interface& interface,
                                                            const std::string& label) override;
 
 private:
     struct Endpoint;
     class FakeListener;
-    std::unique_ptr<ipc::Listener> make(const ipc::Interface& interface, const std::string& label);
 
     Executor& _executor;
     Clock& _clock;

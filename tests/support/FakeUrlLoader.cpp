@@ -5,11 +5,6 @@
 
 namespace platform::test {
 
-void FakeUrlLoader::Task::cancel()
-{
-    fail(Error::withReason(kUrlErrorDomain, kUrlCancelled, "cancelled"));
-}
-
 void FakeUrlLoader::Task::respond(int status, std::string body, HttpHeaders headers, std::optional<Url> from)
 {
     if (files.download) {

@@ -21,7 +21,7 @@ public:
               _queue(std::move(queue))
         {}
         void resume() override { resumed = true; }
-        void cancel() override;
+        void cancel() override { fail(Error::withReason(kUrlErrorDomain, kUrlCancelled, "cancelled")); }
         [[nodiscard]] std::uint64_t identifier() const override { return _identifier; }
         [[nodiscard]] const UrlRequest& originalRequest() const override { return _request; }
         [[nodiscard]] Value timingData() const override { return timing; }
