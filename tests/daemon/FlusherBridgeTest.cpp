@@ -11,16 +11,13 @@ struct BridgeTest : FeedbackTest {
 
     std::shared_ptr<FakeConnection> tool()
     {
-        const auto call = connection->call("ListenToFlusher");
-        device.drain();
-        auto connected = device.ipc.connect(*call->argument(0).asString());
+        auto connected = device.ipc.connect(*call(*connection, "ListenToFlusher")->argument(0).asString());
         device.drain();
         return connected;
     }
     void intent(FakeConnection& tool, std::uint64_t number)
     {
-        tool.call("InitiateConnectionWithIntent", {Value(number)});
-        device.drain();
+        (void)call(tool, "InitiateConnectionWithIntent", {Value(number)});
     }
     static Strings signals(FakeConnection& tool)
     {

@@ -207,15 +207,12 @@ struct ImageLoadingTest : DaemonTest {
     }
     std::shared_ptr<FakeCall> load(Value::Array images, std::uint64_t timeout = 1'000'000'000)
     {
-        auto call = endpoint->call("LoadImages", {std::move(images), timeout});
-        device.drain();
-        return call;
+        return call(*endpoint, "LoadImages", {std::move(images), timeout});
     }
-    using Task = std::shared_ptr<platform::test::FakeUrlLoader::Task>;
     /// Image requests that have been sent, in order, and are not answered yet.
-    std::vector<Task> fetches()
+    std::vector<std::shared_ptr<Task>> fetches()
     {
-        std::vector<Task> found;
+        std::vector<std::shared_ptr<Task>> found;
         for (const auto& each : device.loader.sessions)
             for (const auto& task : each->tasks)
                 if (task->resumed && !task->finished && task->originalRequest().maximumResponseSize &&
@@ -277,8 +274,7 @@ TEST_F(ImageLoadingTest, AnAnswersImagesAreFetchedAhead)
 
     const auto last = fetches().back();
     last->timing = Dictionary{{"mark", 1}};
-    last->respond(200, "pixels");
-    device.drain();
+    answer(*last, "pixels");
     const auto end = session->last<ZREndNetworkSearchFeedback>();
     ASSERT_TRUE(end);
     EXPECT_EQ(end->uuid, started->uuid);
@@ -349,8 +345,7 @@ TEST_F(ImageLoadingTest, WhatIsOnItsWayIsFetchedOnce)
     answerSearch(Value::Array{image("https://a.example/1"), image("https://a.example/2")});
     auto call = load({image("https://a.example/2"), image("https://a.example/2")});
     EXPECT_EQ(fetched(), (Strings{"https://a.example/1", "https://a.example/2"}));
-    fetches()[1]->respond(200, "two");
-    device.drain();
+    answer(*fetches()[1], "two");
     ASSERT_TRUE(call->answered()) << "it waits for none of the others";
     EXPECT_EQ(bytes(*call, "https://a.example/2"), "two");
     answerAll(404);
@@ -396,8 +391,7 @@ TEST_F(ImageLoadingTest, AClientGetsWhatIsThereInTime)
                                                   {"five", platform::Bytes("image 5")}}));
     EXPECT_TRUE(behind->answered());
 
-    all[3]->respond(200, "late");
-    device.drain();
+    answer(*all[3], "late");
     auto again = load({image("https://a.example/4")}, 0);
     ASSERT_TRUE(again->answered());
     EXPECT_EQ(bytes(*again, "https://a.example/4"), "late") << "it came after all";
@@ -427,27 +421,25 @@ TEST_F(ImageLoadingTest, WithoutABagThereAreNoImages)
 
 TEST_F(ImageLoadingTest, EveryFailureIsToldAndTheNextImageIsFetched)
 {
-    using Answering = platform::test::FakeUrlLoader::Task;
     const struct {
         const char* name;
-        std::function<void(Answering&)> answer;
+        std::function<void(Task&)> answer;
         const char* log;
         std::string domain;
         const char* reason; // of the error that is recorded; null for none
         bool disk = true;   // has a place for the image
     } cases[]{
-        {"transport",
-         [](Answering& task) { task.fail(platform::Error::withReason("UrlErrorDomain", -1004, "refused")); },
+        {"transport", [](Task& task) { task.fail(platform::Error::withReason("UrlErrorDomain", -1004, "refused")); },
          "Error fetching image https://a.example/0: UrlErrorDomain -1004: refused", "TAVErrorDomain",
          "image fetch error UrlErrorDomain -1004: refused"},
-        {"status", [](Answering& task) { task.respond(503, "later"); },
-         "Bad status code 503 for image https://a.example/1", "", nullptr},
-        {"no status", [](Answering& task) { task.finish(platform::Bytes(), std::nullopt, std::nullopt); },
+        {"status", [](Task& task) { task.respond(503, "later"); }, "Bad status code 503 for image https://a.example/1",
+         "", nullptr},
+        {"no status", [](Task& task) { task.finish(platform::Bytes(), std::nullopt, std::nullopt); },
          "Bad status code 0 for image https://a.example/2", "", nullptr},
-        {"nothing in it", [](Answering& task) { task.respond(200, ""); }, "mmap failed POSIX 22", "POSIX",
+        {"nothing in it", [](Task& task) { task.respond(200, ""); }, "mmap failed POSIX 22", "POSIX",
          "Invalid argument"},
-        {"no file", [](Answering& task) { task.respond(200, "pixels"); }, "opening file failed POSIX 24",
-         "TAVErrorDomain", "file open failed", false},
+        {"no file", [](Task& task) { task.respond(200, "pixels"); }, "opening file failed POSIX 24", "TAVErrorDomain",
+         "file open failed", false},
     };
     int number = 0;
     for (const auto& c : cases) {

@@ -67,8 +67,7 @@ TEST_F(SearchTest, AnOvertakenAnswerIsNeverDelivered)
     auto older = search(*connection, 4, "wea");
     EXPECT_TRUE(isEmptyAnswer(*same) && isEmptyAnswer(*older)) << "not above the last id: answered at once";
     respond(kAnswer);
-    slow->respond(200, kAnswer);
-    device.drain();
+    answer(*slow, kAnswer);
     EXPECT_TRUE(isEmptyAnswer(*five));
     EXPECT_GT(six->argument(1).count(), 0u);
 
@@ -362,8 +361,7 @@ TEST_F(KindsTest, EachTakesItsRoad)
 
     connection = client();
     tracePoints.clear();
-    connection->call("Feedback", {""});
-    device.drain();
+    (void)call(*connection, "Feedback", {""});
     EXPECT_EQ(tracePoints, (std::vector<std::uint32_t>{0x2b000024, 0x2b000028}));
     for (const char* unserved : {"TAVRequest", "ZRClearInputFeedback", "Unheard"})
         EXPECT_TRUE(request(*connection, unserved, 1)->abandoned()) << unserved;

@@ -279,9 +279,7 @@ TEST_F(SessionTest, FeedbackInMemoryIsAnsweredWithTimesSinceTheFirst)
     report("ZRClearInputFeedback", {{"timestamp", 5'000'000'000}}, 7);
     report("ZRDidGoToSiteFeedback", {{"timestamp", 5'001'999'999}}, 8);
     report("ZRSearchViewDisappearFeedback", {{"timestamp", 4'000'000'000}}, 6);
-    const auto call = connection->call("Feedback", {""});
-    device.drain();
-    const Value events = call->argument(0);
+    const Value events = call(*connection, "Feedback", {""})->argument(0);
     ASSERT_EQ(events.count(), 3u);
     EXPECT_EQ(events[0]["type"], Value("search_view_disappear"));
     EXPECT_EQ(events[0]["timestamp"], Value(0));
@@ -296,10 +294,9 @@ TEST_F(SessionTest, SharedFeedbackInMemoryIsOneAgentsBehindAnothers)
     const auto second = client("com.quorvane.wendral", "Wendral/7", 78);
     for (const auto& [from, timestamp] : {std::pair(second, 5'000'000), {connection, 6'000'000}, {second, 8'000'000}})
         report(*from, "ZRClearInputFeedback", {{"timestamp", timestamp}});
-    const auto call = connection->call("Feedback", {""});
-    device.drain();
+    const Value events = call(*connection, "Feedback", {""})->argument(0);
     Value::Array times;
-    for (std::size_t i = 0; i < call->argument(0).count(); ++i) times.push_back(call->argument(0)[i]["timestamp"]);
+    for (std::size_t i = 0; i < events.count(); ++i) times.push_back(events[i]["timestamp"]);
     EXPECT_EQ(times, (Value::Array{0, 0, 3})) << "Vistrel's, then Wendral's, each since its own first";
 }
 

@@ -10,8 +10,6 @@
 namespace tavrin::test {
 namespace {
 
-using Task = platform::test::FakeUrlLoader::Task;
-
 /// The text that a task searches for; none for other requests.
 std::optional<std::string> searchedFor(const Task& task)
 {

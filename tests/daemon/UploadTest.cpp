@@ -33,11 +33,7 @@ struct UploadTest : FeedbackTest {
         return uploads().back();
     }
     /// Ends the newest upload.
-    void answer(int status)
-    {
-        uploads().back()->respond(status);
-        device.drain();
-    }
+    void answer(int status) { DaemonTest::answer(*uploads().back(), "", status); }
     void fail(std::int64_t code)
     {
         uploads().back()->fail(platform::Error::withReason(platform::kUrlErrorDomain, code, "no"));

@@ -46,10 +46,16 @@ void DaemonTest::startWithoutBag()
     start();
 }
 
-void DaemonTest::respond(std::string body, int status, platform::HttpHeaders headers)
+void DaemonTest::answer(Task& task, std::string body, int status, platform::HttpHeaders headers)
 {
-    lastTask()->respond(status, std::move(body), std::move(headers));
+    task.respond(status, std::move(body), std::move(headers));
     device.drain();
+}
+
+void DaemonTest::deliverBag(const std::string& body)
+{
+    for (const auto& task : std::vector(tasks()))
+        if (task->originalRequest().url.path() == "/bag") answer(*task, body);
 }
 
 void DaemonTest::expireBag()
@@ -79,9 +85,14 @@ std::shared_ptr<FakeCall> DaemonTest::configure(FakeConnection& connection, std:
     fields.set("class", "TAVSessionConfiguration");
     fields.set("identifier", std::move(identifier));
     fields.set("userAgent", std::move(agent));
-    auto call = connection.call("Configure", {std::move(fields)});
+    return call(connection, "Configure", {std::move(fields)});
+}
+
+std::shared_ptr<FakeCall> DaemonTest::call(FakeConnection& connection, std::string_view member, std::vector<Value> args)
+{
+    auto made = connection.call(member, std::move(args));
     device.drain();
-    return call;
+    return made;
 }
 
 void DaemonTest::end(FakeConnection& connection)
@@ -94,9 +105,7 @@ std::shared_ptr<FakeCall> DaemonTest::report(FakeConnection& connection, std::st
                                              std::int64_t queryId)
 {
     fields.set("class", std::move(className));
-    auto call = connection.call("ReportEvent", {"event", queryId, std::move(fields)});
-    device.drain();
-    return call;
+    return call(connection, "ReportEvent", {"event", queryId, std::move(fields)});
 }
 
 std::shared_ptr<FakeCall> DaemonTest::request(FakeConnection& connection, std::string className, std::int64_t queryId,
@@ -106,9 +115,7 @@ std::shared_ptr<FakeCall> DaemonTest::request(FakeConnection& connection, std::s
     fields.set("queryId", queryId);
     if (!fields.contains("scale")) fields.set("scale", 2.0);
     if (!fields.contains("keyboardInputMode")) fields.set("keyboardInputMode", "de");
-    auto call = connection.call("Request", {std::move(fields)});
-    device.drain();
-    return call;
+    return call(connection, "Request", {std::move(fields)});
 }
 
 std::shared_ptr<FakeCall> DaemonTest::search(FakeConnection& connection, std::int64_t queryId, std::string query,

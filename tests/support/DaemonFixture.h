@@ -20,6 +20,7 @@ using platform::test::FakeCall;
 using platform::test::FakeConnection;
 using platform::test::LogCapture;
 using Strings = std::vector<std::string>;
+using Task = platform::test::FakeUrlLoader::Task;
 
 /// Keeps what the daemon records, in order.
 class RecordingSessionManager final : public ClientSessionManager {
@@ -60,9 +61,13 @@ struct DaemonTest : testing::Test {
     /// Requests of the foreground session, in order; the first is the bag's.
     auto& tasks() { return device.loader.sessions.at(0)->tasks; }
     auto lastTask() { return tasks().back(); }
-    void respond(std::string body, int status = 200, platform::HttpHeaders headers = {});
-    /// Answers the bag request that is under way.
-    void deliverBag(std::string body = kBag) { respond(std::move(body)); }
+    void respond(std::string body, int status = 200, platform::HttpHeaders headers = {})
+    {
+        answer(*lastTask(), std::move(body), status, std::move(headers));
+    }
+    void answer(Task& task, std::string body, int status = 200, platform::HttpHeaders headers = {});
+    /// Answers the bag requests that are under way.
+    void deliverBag(const std::string& body = kBag);
     /// Makes the bag stale, and asks for it, which begins the fetch of another.
     void expireBag();
 
@@ -72,6 +77,7 @@ struct DaemonTest : testing::Test {
                                            std::string agent = "Vistrel/4", pid_t pid = 77);
     std::shared_ptr<FakeCall> configure(FakeConnection& connection, std::string identifier, std::string agent,
                                         Dictionary fields = {});
+    std::shared_ptr<FakeCall> call(FakeConnection& connection, std::string_view member, std::vector<Value> args = {});
     /// The client goes away.
     void end(FakeConnection& connection);
     std::shared_ptr<FakeCall> report(FakeConnection& connection, std::string className, Dictionary fields = {},

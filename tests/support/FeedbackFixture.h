@@ -75,23 +75,22 @@ struct FeedbackTest : DaemonTest {
         device.activities.run("com.quorvane.tavrind.flusher.background");
         device.drain();
     }
-    using UploadTask = platform::test::FakeUrlLoader::Task;
-    std::vector<std::shared_ptr<UploadTask>>& allUploads()
+    std::vector<std::shared_ptr<Task>>& allUploads()
     {
         return device.background.loads.at("com.quorvane.tavrind.flusher.nsurlsession")->tasks;
     }
     /// Those since the daemon began, or was restarted.
-    std::vector<std::shared_ptr<UploadTask>> uploads()
+    std::vector<std::shared_ptr<Task>> uploads()
     {
         const auto& all = allUploads();
         return {all.begin() + static_cast<std::ptrdiff_t>(_uploadsBefore), all.end()};
     }
-    static std::string bodyOf(const UploadTask& task)
+    static std::string bodyOf(const Task& task)
     {
         return std::string(platform::readFile(task.files.upload, SIZE_MAX)->view());
     }
     /// An upload's JSON.
-    static Value decoded(const UploadTask& task)
+    static Value decoded(const Task& task)
     {
         const auto text = tools::inflateRaw(bodyOf(task), 64u << 20);
         return text ? platform::parseJson(*text).value_or(Value()) : Value();
