@@ -105,10 +105,7 @@ struct DownloadManagerTest : test::AssemblyTest {
         const auto found = device.files.files.find(directory / identifier);
         return found == device.files.files.end() ? "(none)" : found->second;
     }
-    Value storedUrl(const std::string& identifier)
-    {
-        return device.userDefaults.value("download_resources")[identifier]["url"];
-    }
+    Value stored(const std::string& identifier) { return device.userDefaults.value("download_resources")[identifier]; }
 
     const std::filesystem::path directory = "/caches/com.quorvane.tavrind";
     std::shared_ptr<FakeLookup> lookup = std::make_shared<FakeLookup>();
@@ -140,13 +137,13 @@ TEST_F(DownloadManagerTest, AResourceIsFetchedOnceForEachUrlWithTheVersionAtHand
     EXPECT_EQ(header(first, "X-Quorvane-Download-Identifier"), "TAVQIFeatures");
     EXPECT_EQ(header(first, "If-None-Match"), "");
     EXPECT_TRUE(log.count("reason: update delay: 60.000000"));
-    EXPECT_TRUE(storedUrl("TAVQIFeatures").isNull()) << "not before the answer";
+    EXPECT_TRUE(stored("TAVQIFeatures")["url"].isNull()) << "not before the answer";
     EXPECT_EQ(manager->fileHandleForResource("TAVQIFeatures").error().code, 404);
 
     deliver(200, "one");
     EXPECT_EQ(contents("TAVQIFeatures"), "one");
     EXPECT_EQ(told.back(), "TAVQIFeatures at /caches/com.quorvane.tavrind/TAVQIFeatures: one");
-    EXPECT_EQ(storedUrl("TAVQIFeatures"), Value("https://r.example/f?version=1"));
+    EXPECT_EQ(stored("TAVQIFeatures")["url"], Value("https://r.example/f?version=1"));
     EXPECT_EQ(manager->resourceVersions(), (Dictionary{{"TAVQIFeatures", "1"}}));
     EXPECT_EQ(device.counters.value("com.quorvane.tavrind.resourcefilesfetched"), 1);
 
@@ -202,7 +199,7 @@ TEST_F(DownloadManagerTest, WhatFailsLeavesTheOldFileAndIsTriedAgainWithTheNextB
         device.files.fault = nullptr;
         EXPECT_GT(log.count(c.line), lines) << c.what;
         EXPECT_EQ(contents("TAVQIFeatures"), "old") << c.what;
-        EXPECT_EQ(storedUrl("TAVQIFeatures"), Value("https://r.example/f?version=1")) << c.what;
+        EXPECT_EQ(stored("TAVQIFeatures")["url"], Value("https://r.example/f?version=1")) << c.what;
     }
     EXPECT_EQ(device.counters.value("com.quorvane.tavrind.resourcefilesfetched"), 1);
     download("TAVQIFeatures", "https://r.example/f?version=2");
@@ -266,7 +263,7 @@ TEST_F(DownloadManagerTest, WhatTheBagNoLongerListsIsDeleted)
     bag({});
     EXPECT_EQ(contents("TAVQIFeatures"), "(none)");
     EXPECT_FALSE(manager->resourceForKey("TAVQIFeatures"));
-    EXPECT_TRUE(device.userDefaults.value("download_resources")["TAVQIFeatures"].isNull());
+    EXPECT_TRUE(stored("TAVQIFeatures").isNull());
     EXPECT_EQ(told, std::vector<std::string>{"deleted"});
     device.notifications.post({.name = TAVBagChangeNotification, .userInfo = {{"bagError", platform::Error()}}});
     device.drain();
@@ -296,8 +293,7 @@ TEST_F(DownloadManagerTest, LookupHintsFollowTheBagTheirRedirectAndTheLocation)
     EXPECT_EQ(header(first->originalRequest(), "X-Quorvane-FuzzedLatLong"),
               assembly.requestFactory->context().geoLocationLatLng);
     deliver(200, "x", urlOf("https://r.example/de/hints/2026/w1"));
-    EXPECT_EQ(device.userDefaults.value("download_resources")[hints]["redirect_url"],
-              Value("https://r.example/de/hints/2026/w1"));
+    EXPECT_EQ(stored(hints)["redirect_url"], Value("https://r.example/de/hints/2026/w1"));
     EXPECT_EQ(Value(DownloadManager(assembly).resourceVersions())[hints], Value("2026-w1-hints"))
         << "before any task runs";
 
@@ -311,8 +307,7 @@ TEST_F(DownloadManagerTest, LookupHintsFollowTheBagTheirRedirectAndTheLocation)
     }
     (void)download(hints, "https://r.example/hints?version=1");
     deliver(200, "x"); // from where it was asked for
-    EXPECT_TRUE(device.userDefaults.value("download_resources")[hints]["redirect_url"].isNull())
-        << "the earlier redirect is not that of this file";
+    EXPECT_TRUE(stored(hints)["redirect_url"].isNull()) << "the earlier redirect is not that of this file";
 
     std::size_t before = tasks().size();
     bag({{hints, "https://r.example/hints?version=2"}});
@@ -336,7 +331,7 @@ TEST_F(DownloadManagerTest, LookupHintsFollowTheBagTheirRedirectAndTheLocation)
     EXPECT_FALSE(manager->resourceForKey(hints));
     EXPECT_EQ(contents(hints), "x");
     EXPECT_EQ(told, std::vector<std::string>{"deleted"}) << "whoever uses the hints of another place stops";
-    EXPECT_TRUE(device.userDefaults.value("download_resources")[hints].isNull());
+    EXPECT_TRUE(stored(hints).isNull());
     const auto elsewhere = download(hints, "https://r.example/hints?version=1");
     EXPECT_EQ(header(elsewhere->originalRequest(), "If-None-Match"), "") << "another place has other hints";
 }

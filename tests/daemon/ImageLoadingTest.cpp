@@ -10,7 +10,6 @@
 #include "searchrecords/ZRNetworkFeedback.h"
 #include "tavrind/ClientStateManager.h"
 #include "tavrind/ImageFetches.h"
-#include "tavrind/TavrinBagController.h"
 #include "tests/support/DaemonFixture.h"
 
 namespace tavrin::test {

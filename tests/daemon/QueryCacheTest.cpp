@@ -4,7 +4,6 @@
 
 #include "CoreTavrin/TAVFeedback.h"
 #include "CoreTavrin/TAVRequest.h"
-#include "platform/text/Text.h"
 #include "platform/values/Json.h"
 #include "tavrind/TavrinUserGUIDController.h"
 #include "tests/support/DaemonFixture.h"

@@ -6,7 +6,6 @@
 #include "tavrind/mmap_file.h"
 #include "tavrind/OutputStream.h"
 #include "tavrind/StoredSession.h"
-#include "tavrind/TavrinFeedbackFlusher.h"
 #include "tests/support/Encodings.h"
 #include "tests/support/Examples.h"
 #include "tests/support/FeedbackFixture.h"
