@@ -322,25 +322,7 @@ TEST_F(ConnectionTest, WarmsTheConnectionWhenASearchViewAppears)
     }
 }
 
-// ---- With real sessions
-
-struct RecordedConnectionTest : FeedbackTest {
-    /// The start records in the session files on disk, by their URL's path.
-    std::map<std::string, Value> startRecords()
-    {
-        std::map<std::string, Value> found;
-        for (const auto& [path, contents] : device.files.files) {
-            if (!path.filename().string().starts_with("session.")) continue;
-            ArchivedDataIterator records{platform::Bytes(contents)};
-            while (const auto archive = records.readNextObject()) {
-                const Value record = platform::valueFromArchive(*archive).value();
-                if (record["feedback"]["class"] == Value("ZRStartNetworkSearchFeedback"))
-                    found[platform::Url::parse(*record["feedback"]["url"].asString())->path()] = record;
-            }
-        }
-        return found;
-    }
-};
+using RecordedConnectionTest = FeedbackTest;
 
 TEST_F(RecordedConnectionTest, TheDaemonsOwnRequestsAreRecordedAsItsOwn)
 {
@@ -350,13 +332,21 @@ TEST_F(RecordedConnectionTest, TheDaemonsOwnRequestsAreRecordedAsItsOwn)
     connection = client();
     device.advance(31s);
     report("ZRSearchViewAppearFeedback", {{"viewAppearEvent", 2}});
-    auto records = startRecords();
+    std::map<std::string, Value> starts; // in the session files on disk, by their URL's path
+    for (const std::string& name : sessionFiles()) {
+        ArchivedDataIterator records{platform::Bytes(device.files.files.at("/caches/com.quorvane.tavrind/" + name))};
+        while (const auto archive = records.readNextObject()) {
+            const Value record = platform::valueFromArchive(*archive).value();
+            if (record["feedback"]["class"] == Value("ZRStartNetworkSearchFeedback"))
+                starts[platform::Url::parse(*record["feedback"]["url"].asString())->path()] = record;
+        }
+    }
     const struct {
         const char* path;
         int trigger, endpoint;
     } expected[]{{"/bag", 16, 10}, {"/warm", 19, 12}};
     for (const auto& [path, trigger, endpoint] : expected) {
-        const Value& record = records[path];
+        const Value& record = starts[path];
         EXPECT_EQ(record["feedback"]["triggerEvent"], Value(trigger)) << path;
         EXPECT_EQ(record["feedback"]["endpoint"], Value(endpoint)) << path;
         EXPECT_EQ(record["feedback"]["input"], Value("")) << path;
@@ -375,23 +365,20 @@ TEST_F(RecordedConnectionTest, EveryEventAndEverySearchNoticesAStaleBag)
             tasks(), [](const auto& task) { return !task->finished && task->originalRequest().url.path() == "/bag"; });
     };
     std::int64_t id = 0;
-    const std::pair<const char*, std::function<void()>> reads[]{
-        {"event", [&] { appear(); }},
-        {"search", [&] { (void)search(*connection, ++id, "weat"); }},
-    };
-    const std::pair<const char*, std::function<void()>> changes[]{
-        {"time", [&] { device.clock.setWall(device.clock.wallNow() + 14400s - 599s); }},
-        {"default", [&] { device.userDefaults.set("TAVBagURL", fmt::format("https://b{}.example/bag", ++id)); }},
-    };
-    for (const auto& [change, make] : changes) {
-        for (const auto& [read, perform] : reads) {
+    for (const bool byTime : {true, false}) {
+        for (const bool byEvent : {true, false}) {
+            SCOPED_TRACE(fmt::format("stale by {}, read by {}", byTime ? "time" : "URL", byEvent ? "event" : "search"));
+            const auto read = [&] { byEvent ? appear() : (void)search(*connection, ++id, "weat"); };
             for (int i = 0; i < 2; ++i) {
-                perform();
-                EXPECT_EQ(fetches(), 0) << change << ", " << read << ": the bag is fresh";
+                read();
+                EXPECT_EQ(fetches(), 0) << "the bag is fresh";
             }
-            make();
-            perform();
-            ASSERT_EQ(fetches(), 1) << change << ", " << read;
+            if (byTime)
+                device.clock.setWall(device.clock.wallNow() + 14400s - 599s);
+            else
+                device.userDefaults.set("TAVBagURL", fmt::format("https://b{}.example/bag", ++id));
+            read();
+            ASSERT_EQ(fetches(), 1);
             deliverBag(kFeedbackBag);
         }
     }

@@ -16,8 +16,6 @@ namespace tavrin {
 namespace {
 
 using platform::ActivityState;
-using platform::AppActivity;
-using platform::test::LogCapture;
 
 TEST(DeepLink, NormalizationLeavesOnlyWhereALinkLeads)
 {
@@ -196,10 +194,10 @@ struct DeepLinkIngesterTest : test::DaemonTest {
     DeepLinkIngesterTest() { start(); }
     void add(std::string app, std::string url, platform::Duration before = 1h, bool isPublic = true)
     {
-        const AppActivity activity{.start = device.clock.wallNow() - before,
-                                   .bundleIdentifier = std::move(app),
-                                   .contentUrl = std::move(url),
-                                   .publiclyIndexable = isPublic};
+        const platform::AppActivity activity{.start = device.clock.wallNow() - before,
+                                             .bundleIdentifier = std::move(app),
+                                             .contentUrl = std::move(url),
+                                             .publiclyIndexable = isPublic};
         ASSERT_TRUE(
             platform::AppActivities(device.files, database.parent_path()).add(activity, device.clock.wallNow()));
     }
@@ -229,7 +227,7 @@ struct DeepLinkIngesterTest : test::DaemonTest {
 
     const std::filesystem::path database = "/data/com.quorvane.tavrind/knowledge/app-activities.db";
     const std::filesystem::path resources = "/caches/com.quorvane.tavrind";
-    LogCapture log;
+    platform::test::LogCapture log;
     static constexpr const char* kWhitelist = R"({"static_apps_whitelist": ["org.allowed", 7]})";
     static constexpr const char* kBlacklist = R"({"static_deeplinks_blacklist": ["a.example/no", "org.denied"]})";
 };

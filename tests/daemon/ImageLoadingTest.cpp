@@ -36,8 +36,6 @@ Strings textsOf(const std::vector<Url>& urls)
     return texts;
 }
 
-// ---- Finding and ordering
-
 TEST(ResponseImages, StandUnderTheirRoles)
 {
     Strings found;
@@ -181,8 +179,6 @@ TEST_F(ImageFetchesTest, AFullLaneTakesNoMore)
     EXPECT_TRUE(add("ahead/2"));
 }
 
-// ---- The daemon
-
 struct ImageLoadingTest : DaemonTest {
     ImageLoadingTest()
     {
@@ -225,18 +221,12 @@ struct ImageLoadingTest : DaemonTest {
         for (const auto& task : fetches()) urls.push_back(task->originalRequest().url.string());
         return urls;
     }
-    /// Answers every image request, and those that follow.
     void answerAll(int status = 200, const std::string& body = "pixels")
     {
         for (auto left = fetches(); !left.empty(); left = fetches()) {
             for (const auto& task : left) task->respond(status, body);
             device.drain();
         }
-    }
-    std::string cached(const std::string& url)
-    {
-        const auto kept = assembly().urlSession->cache()->find(*Url::parse(url));
-        return kept ? std::string(kept->body.view()) : "none";
     }
     static std::string bytes(FakeCall& call, const std::string& name)
     {
@@ -280,7 +270,9 @@ TEST_F(ImageLoadingTest, AnAnswersImagesAreFetchedAhead)
     EXPECT_EQ(end->responseSize, 6);
     EXPECT_EQ(end->statusCode, 200);
     EXPECT_EQ(end->networkTimingData["mark"], Value(1));
-    EXPECT_EQ(cached("https://i.example/one"), "pixels");
+    const auto kept = assembly().urlSession->cache()->find(*Url::parse("https://i.example/one"));
+    ASSERT_TRUE(kept);
+    EXPECT_EQ(kept->body.view(), "pixels");
     EXPECT_TRUE(log.has(LogLevel::Default, "Tavrin_Images", "Fetched image https://i.example/one"));
     EXPECT_TRUE(log.has(LogLevel::Default, "Tavrin_Images", "caching 6 bytes for https://i.example/one"));
     answerAll();

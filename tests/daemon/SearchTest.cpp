@@ -242,8 +242,6 @@ TEST_F(SearchTest, TheLogDoesNotTellWhatTheUserTypesAndSees)
     platform::Log::privateData = true;
 }
 
-// ---- What the kinds of request have of their own
-
 struct Kind {
     const char* className;
     Dictionary fields;
@@ -313,7 +311,6 @@ struct KindsTest : SearchTest {
 
     std::shared_ptr<FakeCall> ask(FakeConnection& connection, const Kind& kind)
     {
-        SCOPED_TRACE(kind.className);
         session->records.clear();
         tracePoints.clear();
         Dictionary fields = kind.fields;

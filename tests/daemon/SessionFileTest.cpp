@@ -86,14 +86,6 @@ struct SessionFileTest : FeedbackTest {
         return inputs;
     }
 
-    static std::vector<std::size_t> recordEnds(const std::string& file)
-    {
-        std::vector<std::size_t> ends;
-        ArchivedDataIterator records{platform::Bytes(file)};
-        while (records.readNextObject()) ends.push_back(records.position());
-        return ends;
-    }
-
     static constexpr const char* kGuid = "01234567-89AB-4DEF-8123-456789ABCDEF";
 };
 
@@ -112,7 +104,9 @@ TEST_F(SessionFileTest, CutAnywhereItGivesEveryWholeEventBeforeTheCut)
 {
     const Strings inputs{"a", "bb", "ccc", "dddd"};
     const std::string whole = contents(closedFile(inputs)->fileUrl().filename());
-    const auto ends = recordEnds(whole);
+    std::vector<std::size_t> ends; // of the records
+    ArchivedDataIterator records{platform::Bytes(whole)};
+    while (records.readNextObject()) ends.push_back(records.position());
     ASSERT_EQ(ends.size(), 6u);
     for (std::size_t cut = 0; cut <= whole.size(); ++cut) {
         const auto [session, lost, fate] = adopted(whole.substr(0, cut))->read();
@@ -281,8 +275,6 @@ TEST_F(SessionFileTest, UploadsAreInOrderOfTime)
     EXPECT_EQ(events[4]["type"], Value("session_missing_results"));
     EXPECT_EQ(events[4]["results"].count(), 4u);
 }
-
-// The directory
 
 TEST_F(SessionFileTest, FilesOfAnEarlierProcessAreCountedOneByOneAfterTheStart)
 {

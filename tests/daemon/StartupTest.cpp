@@ -1,5 +1,3 @@
-// What the daemon is made of when it starts: its sessions, its settings.
-
 #include <cstdlib>
 
 #include "tavrind/TAVTracing.h"

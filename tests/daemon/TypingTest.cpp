@@ -74,8 +74,7 @@ private:
     }
     void disconnect(User& user)
     {
-        user.connection->end();
-        _test.device.drain();
+        _test.end(*user.connection);
         for (Call& call : user.calls) _gone.push_back(std::move(call));
         user = User();
     }
@@ -86,8 +85,7 @@ private:
         const auto bag = std::ranges::find_if(_test.tasks(),
                                               [](const auto& task) { return !task->finished && !searchedFor(*task); });
         if (bag == _test.tasks().end()) return false;
-        (*bag)->respond(200, DaemonTest::kBag);
-        _test.device.drain();
+        _test.answer(**bag, DaemonTest::kBag);
         return true;
     }
 

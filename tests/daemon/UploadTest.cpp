@@ -441,8 +441,6 @@ TEST_F(UploadTest, BooksThatCannotBeReadAreAddedLater)
     EXPECT_EQ(booked(FeedbackFate::Unknown), 1);
 }
 
-// The stream
-
 /// Little of it repeats.
 std::string textOf(std::size_t size)
 {

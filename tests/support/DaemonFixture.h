@@ -78,7 +78,6 @@ struct DaemonTest : testing::Test {
     std::shared_ptr<FakeCall> configure(FakeConnection& connection, std::string identifier, std::string agent,
                                         Dictionary fields = {});
     std::shared_ptr<FakeCall> call(FakeConnection& connection, std::string_view member, std::vector<Value> args = {});
-    /// The client goes away.
     void end(FakeConnection& connection);
     std::shared_ptr<FakeCall> report(FakeConnection& connection, std::string className, Dictionary fields = {},
                                      std::int64_t queryId = 1);
@@ -103,7 +102,6 @@ struct DaemonTest : testing::Test {
 /// An answer that has neither record nor error.
 bool isEmptyAnswer(FakeCall& call);
 
-/// The "reason" of a request's error.
 std::string reasonOf(FakeCall& call);
 
 } // namespace tavrin::test

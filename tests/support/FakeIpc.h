@@ -31,7 +31,6 @@ private:
     std::optional<ipc::CallResult> _result;
 };
 
-/// One push that a service sent to its peer.
 struct FakePush {
     std::string signal;
     ipc::Message message;
@@ -46,12 +45,10 @@ public:
     // the peer's side
     std::shared_ptr<FakeCall> call(std::string_view member, std::vector<Value> args = {});
     std::shared_ptr<FakeCall> call(std::string_view member, ipc::Message arguments);
-    /// The peer goes away.
     void end() { finish(false); }
     /// What was pushed so far, in order; it is taken out.
     [[nodiscard]] std::vector<FakePush> takePushes() { return std::exchange(_pushes, {}); }
     [[nodiscard]] bool resumed() const { return _resumed; }
-    /// True once either side has ended the connection.
     [[nodiscard]] bool invalidated() const { return _invalidated; }
 
     // the service's side
@@ -90,7 +87,6 @@ public:
     /// A connection to the newest living listener of that interface or address, already handed to its acceptor on this
     /// thread; null where there is no such listener or it doesn't accept yet.
     std::shared_ptr<FakeConnection> connect(std::string_view interfaceOrAddress, ipc::Peer peer = {1, 0});
-    /// All peers go away.
     void endAll();
 
     [[nodiscard]] Result<std::unique_ptr<ipc::Listener>> listen(const ipc::Interface& interface,

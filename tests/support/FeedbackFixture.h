@@ -24,7 +24,6 @@ struct FeedbackTest : DaemonTest {
         device.files.directories.insert("/tmp");
     }
 
-    /// A daemon with a bag, and a client.
     void begin(bool shared = true)
     {
         device.userDefaults.set("TAVSharedSession", shared);
@@ -69,7 +68,6 @@ struct FeedbackTest : DaemonTest {
         device.drain();
         respond(std::move(body));
     }
-    /// One pass of the background activity.
     void upload()
     {
         device.activities.run("com.quorvane.tavrind.flusher.background");
@@ -89,7 +87,6 @@ struct FeedbackTest : DaemonTest {
     {
         return std::string(platform::readFile(task.files.upload, SIZE_MAX)->view());
     }
-    /// An upload's JSON.
     static Value decoded(const Task& task)
     {
         const auto text = tools::inflateRaw(bodyOf(task), 64u << 20);
@@ -103,7 +100,6 @@ struct FeedbackTest : DaemonTest {
         return types;
     }
 
-    /// The session files, by name.
     Strings sessionFiles()
     {
         Strings names;
