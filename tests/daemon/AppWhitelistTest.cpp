@@ -1,4 +1,5 @@
 #include <fstream>
+#include <numeric>
 #include <set>
 #include <sstream>
 #include <sys/mman.h>
@@ -84,12 +85,11 @@ TEST(AppSignature, VersionsAreHexadecimalBytesOfWhichTheLastTwoCount)
     }
 }
 
-/// The blocks of hexadecimal bytes in a page, as base64 texts.
-std::set<std::string> hexExamples(const char* page)
+TEST(AppSignature, IsAsTheExamplesOfThePageSay)
 {
-    std::ifstream file(std::string(SOURCE_DIR "/docs/") + page);
-    std::set<std::string> examples;
-    for (std::string line, before; std::getline(file, line); before = line) {
+    std::ifstream page(SOURCE_DIR "/docs/formats.md");
+    std::set<std::string> examples; // blocks of hexadecimal bytes, as base64 texts
+    for (std::string line, before; std::getline(page, line); before = line) {
         if (before != "```") continue;
         std::istringstream words(line);
         std::string bytes;
@@ -97,14 +97,8 @@ std::set<std::string> hexExamples(const char* page)
         const std::string text = platform::toJson(Value(platform::Bytes(bytes)));
         examples.insert(text.substr(1, text.size() - 2));
     }
-    return examples;
-}
-
-TEST(AppSignature, IsAsTheExamplesOfThePageSay)
-{
-    std::vector<std::uint32_t> first300;
-    for (std::uint32_t id = 0; id < 300; ++id) first300.push_back(id);
-    const auto examples = hexExamples("formats.md");
+    std::vector<std::uint32_t> first300(300);
+    std::iota(first300.begin(), first300.end(), 0u);
     EXPECT_TRUE(examples.contains(*signatureOf({1, 3})));
     EXPECT_TRUE(examples.contains(*signatureOf(first300, "0a9b2c")));
 }
