@@ -115,6 +115,13 @@ struct ActivitySchedulerTest : testing::Test, test::ByHand {
         advance(0s);
     }
     std::vector<std::string> taken() { return std::exchange(runs, {}); }
+    void expectOneRunAfter(Duration time)
+    {
+        advance(time - 1s);
+        EXPECT_TRUE(taken().empty());
+        advance(1s);
+        EXPECT_EQ(taken().size(), 1u);
+    }
 
     test::MemoryFiles files;
     test::FakeDeviceUse use{executor};
@@ -122,6 +129,10 @@ struct ActivitySchedulerTest : testing::Test, test::ByHand {
     const std::uint64_t began = clock.hostTicks();
     std::vector<std::string> runs;
     std::vector<std::shared_ptr<Activity>> held;
+    /// A handler whose runs go on until a test ends them.
+    const std::function<void(const std::shared_ptr<Activity>&)> hold = [this](const auto& activity) {
+        if (activity->setState(Continue)) held.push_back(activity);
+    };
     using Runs = std::vector<std::string>;
     const ActivityCriteria flush{.repeating = true, .delay = 300s, .gracePeriod = 300s, .interval = 600s};
 };
@@ -170,11 +181,7 @@ TEST_F(ActivitySchedulerTest, AProcessThatIsKilledOftenRunsActivitiesAndNoneMore
 
 TEST_F(ActivitySchedulerTest, ARunThatTheProcessDoesntSurviveIsNotRepeatedAtOnce)
 {
-    add("a", flush, [this](const auto& activity) {
-        if (activity->state() == ActivityState::Run) executor.execute(Priority::Default, [] {});
-        held.push_back(activity);
-        (void)activity->setState(Continue);
-    });
+    add("a", flush, hold);
     advance(300s);
     EXPECT_EQ(taken().size(), 1u);
     const auto disk = files.files;
@@ -191,22 +198,16 @@ TEST_F(ActivitySchedulerTest, ARunThatTheProcessDoesntSurviveIsNotRepeatedAtOnce
 TEST_F(ActivitySchedulerTest, LeapsOfTheClockNeitherHoldBackNorHurry)
 {
     for (const Duration leap : {24h * 365 * 30, -24h * 365 * 30, -2h, 24h * 8}) {
+        SCOPED_TRACE(toSeconds(leap));
         add("a", flush);
-        advance(300s);
-        EXPECT_EQ(taken().size(), 1u);
+        expectOneRunAfter(300s);
         clock.setWall(clock.wallNow() + leap);
-        advance(599s);
-        EXPECT_TRUE(taken().empty());
-        advance(1s);
-        EXPECT_EQ(taken().size(), 1u);
+        expectOneRunAfter(600s);
         kill();
         clock.setWall(clock.wallNow() + leap);
         start();
         add("a", {.repeating = true, .interval = 600s});
-        advance(599s);
-        EXPECT_TRUE(taken().empty()) << toSeconds(leap);
-        advance(1s);
-        EXPECT_EQ(taken().size(), 1u) << toSeconds(leap);
+        expectOneRunAfter(600s);
         scheduler->unregister("a");
     }
     kill();
@@ -258,9 +259,7 @@ TEST_F(ActivitySchedulerTest, StatesMoveOnOnly)
 
 TEST_F(ActivitySchedulerTest, ALongRunIsNotRepeatedBesideItself)
 {
-    add("a", {.repeating = true, .interval = 600s}, [this](const auto& activity) {
-        if (activity->setState(Continue)) held.push_back(activity);
-    });
+    add("a", {.repeating = true, .interval = 600s}, hold);
     advance(1h);
     EXPECT_EQ(taken(), (Runs{"a 0"}));
     EXPECT_TRUE(held.at(0)->setState(Done));
@@ -284,9 +283,7 @@ TEST_F(ActivitySchedulerTest, CriteriaFromTheCheckInAreWaitedFor)
 
 TEST_F(ActivitySchedulerTest, ARunHearsThatItHadBetterStop)
 {
-    add("a", {.allowBattery = false}, [this](const auto& activity) {
-        if (activity->setState(Continue)) held.push_back(activity);
-    });
+    add("a", {.allowBattery = false}, hold);
     ASSERT_EQ(held.size(), 1u);
     EXPECT_FALSE(held[0]->shouldDefer());
     use.now.onBattery = true;
@@ -297,9 +294,7 @@ TEST_F(ActivitySchedulerTest, ARunHearsThatItHadBetterStop)
 
 TEST_F(ActivitySchedulerTest, ANewRegistrationTakesTheOldOnesPlace)
 {
-    add("a", flush, [this](const auto& activity) {
-        if (activity->setState(Continue)) held.push_back(activity);
-    });
+    add("a", flush, hold);
     advance(300s);
     add("a", {.repeating = true, .delay = 10s, .interval = 600s});
     EXPECT_TRUE(held.at(0)->setState(Done)) << "ends on its own";

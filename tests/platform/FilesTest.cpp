@@ -4,7 +4,6 @@
 #include <fcntl.h>
 #include <map>
 #include <optional>
-#include <sys/resource.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -249,14 +248,8 @@ TEST_F(FilesTest, WatchesShareOneInotifyInstanceAndSayWhenThereIsNone)
     const auto watch = [&](const char* name) {
         watches.push_back(std::make_unique<FileWatch>(loop, directory / name, [&] { ++seen; }));
     };
-    rlimit before{};
-    ASSERT_EQ(getrlimit(RLIMIT_NOFILE, &before), 0);
-    rlimit none = before;
-    none.rlim_cur = 0;
     const test::LogCapture log;
-    ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &none), 0);
-    watch("unseen");
-    setrlimit(RLIMIT_NOFILE, &before);
+    test::withLimit(RLIMIT_NOFILE, 0, [&] { watch("unseen"); });
     EXPECT_EQ(log.count("unseen, its changes are not noticed"), 1);
     for (const char* name : {"a", "b", "later/c"}) watch(name);
     EXPECT_EQ(inotifyInstances(), 1);

@@ -1,13 +1,9 @@
 #include "platform/ipc/Ipc.h"
 
-#include <cstdlib>
-#include <deque>
 #include <filesystem>
 #include <fstream>
 #include <future>
 #include <poll.h>
-#include <sys/mman.h>
-#include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
@@ -22,12 +18,10 @@
 #include "platform/ipc/BusClient.h"
 #include "platform/ipc/BusInput.h"
 #include "platform/ipc/BusMessage.h"
-#include "platform/ipc/BusTransport.h"
 #include "platform/ipc/ListenSocket.h"
-#include "platform/run/RunLoop.h"
-#include "platform/run/WorkerPool.h"
 #include "platform/values/Dictionary.h"
 #include "platform/values/Json.h"
+#include "tests/support/FullDisk.h"
 #include "tests/support/ProbeService.h"
 
 namespace platform::ipc {
@@ -537,15 +531,12 @@ TEST(Ipc, AProcessShortOfDescriptorsAcceptsLater)
     LogTap tap([&](const LogLine& line) {
         if (line.text.find("can't accept") != std::string::npos && ++starvations == 1) starved.set_value();
     });
-    rlimit before{};
-    getrlimit(RLIMIT_NOFILE, &before);
-    const rlimit none{1, before.rlim_max};
-    FileHandle socket = newSocket();
-    setrlimit(RLIMIT_NOFILE, &none);
-    connectTo(service, socket);
-    starved.get_future().wait();
-    service.settle();
-    setrlimit(RLIMIT_NOFILE, &before);
+    const FileHandle socket = newSocket();
+    platform::test::withLimit(RLIMIT_NOFILE, 1, [&] {
+        connectTo(service, socket);
+        starved.get_future().wait();
+        service.settle();
+    });
     EXPECT_EQ(starvations, 1);
     service.pass(1s);
     service.await([&] { return service.connections.size() == 1; });

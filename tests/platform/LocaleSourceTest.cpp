@@ -15,40 +15,26 @@ using test::writeFile;
 
 TEST(LocaleContext, FollowsTheEnvironment)
 {
-    const struct {
-        const char* locale;
-        std::string identifier, region, calendar;
-        bool is24Hour;
-        std::string measurement, systemLanguage, preferred;
-    } cases[]{
-        {"de_CH.UTF-8", "de_CH", "CH", "gregorian", true, "Metric", "de", "de-CH"},
-        {"de_DE@euro", "de_DE", "DE", "gregorian", true, "Metric", "de", "de-DE"},
-        {"en_US.UTF-8", "en_US", "US", "gregorian", false, "U.S.", "en", "en-US"},
-        {"en_GB", "en_GB", "GB", "gregorian", true, "U.K.", "en", "en-GB"},
-        {"en_AU", "en_AU", "AU", "gregorian", false, "Metric", "en", "en-AU"},
-        {"th_TH", "th_TH", "TH", "buddhist", true, "Metric", "th", "th-TH"},
-        {"fa_IR", "fa_IR", "IR", "persian", false, "Metric", "fa", "fa-IR"},
-        {"zh_CN.GB18030", "zh_CN", "CN", "gregorian", false, "Metric", "zh", "zh-CN"},
-        {"zh_TW", "zh_TW", "TW", "gregorian", false, "Metric", "zh-Hant", "zh-TW"},
-        {"sr_RS", "sr_RS", "RS", "gregorian", true, "Metric", "sr", "sr-RS"},
-        {"fr", "fr", "", "gregorian", true, "Metric", "fr", "fr"},
-        {"", "en_US", "US", "gregorian", false, "U.S.", "en", "en-US"},
-        {"C", "en_US", "US", "gregorian", false, "U.S.", "en", "en-US"},
-        {"C.UTF-8", "en_US", "US", "gregorian", false, "U.S.", "en", "en-US"},
-        {"POSIX", "en_US", "US", "gregorian", false, "U.S.", "en", "en-US"},
-        {"@euro", "en_US", "US", "gregorian", false, "U.S.", "en", "en-US"},
-        {"_CH", "en_US", "US", "gregorian", false, "U.S.", "en", "en-US"},
+    const std::pair<const char*, LocaleContext> cases[]{
+        {"de_CH.UTF-8", {"de_CH", "de", {"de-CH"}, "gregorian", true, "Metric", "CH"}},
+        {"de_DE@euro", {"de_DE", "de", {"de-DE"}, "gregorian", true, "Metric", "DE"}},
+        {"en_US.UTF-8", {"en_US", "en", {"en-US"}, "gregorian", false, "U.S.", "US"}},
+        {"en_GB", {"en_GB", "en", {"en-GB"}, "gregorian", true, "U.K.", "GB"}},
+        {"en_AU", {"en_AU", "en", {"en-AU"}, "gregorian", false, "Metric", "AU"}},
+        {"th_TH", {"th_TH", "th", {"th-TH"}, "buddhist", true, "Metric", "TH"}},
+        {"fa_IR", {"fa_IR", "fa", {"fa-IR"}, "persian", false, "Metric", "IR"}},
+        {"zh_CN.GB18030", {"zh_CN", "zh", {"zh-CN"}, "gregorian", false, "Metric", "CN"}},
+        {"zh_TW", {"zh_TW", "zh-Hant", {"zh-TW"}, "gregorian", false, "Metric", "TW"}},
+        {"sr_RS", {"sr_RS", "sr", {"sr-RS"}, "gregorian", true, "Metric", "RS"}},
+        {"fr", {"fr", "fr", {"fr"}, "gregorian", true, "Metric", ""}},
+        {"", {}},
+        {"C", {}},
+        {"C.UTF-8", {}},
+        {"POSIX", {}},
+        {"@euro", {}},
+        {"_CH", {}},
     };
-    for (const auto& c : cases) {
-        const LocaleContext context = localeContext(c.locale);
-        EXPECT_EQ(context.identifier, c.identifier) << c.locale;
-        EXPECT_EQ(context.region, c.region) << c.locale;
-        EXPECT_EQ(context.calendar, c.calendar) << c.locale;
-        EXPECT_EQ(context.is24Hour, c.is24Hour) << c.locale;
-        EXPECT_EQ(context.measurementSystem, c.measurement) << c.locale;
-        EXPECT_EQ(context.systemLanguage, c.systemLanguage) << c.locale;
-        EXPECT_EQ(context.preferredLanguages, std::vector{c.preferred}) << c.locale;
-    }
+    for (const auto& [locale, context] : cases) EXPECT_EQ(localeContext(locale), context) << locale;
     EXPECT_EQ(localeContext(std::string(100'000, 'x')), LocaleContext()) << "nonsense reads as nothing";
 }
 

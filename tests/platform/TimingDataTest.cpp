@@ -146,7 +146,7 @@ TEST_F(TimingDataTest, PeerAddressIsTheServers)
         const Value timing = load(server.url()).timing;
         const Bytes* bytes = timing["_kCFNTimingDataConnectionPeerAddress"].asBytes();
         ASSERT_NE(bytes, nullptr);
-        EXPECT_EQ(*bytes, Bytes(socketAddress(address, server.port())));
+        EXPECT_EQ(*bytes, Bytes(socketAddress(address, *server.url().port())));
     }
 }
 

@@ -80,7 +80,6 @@ struct TestHttpServer::Impl {
     struct Connection {
         FileHandle socket;
         Ssl ssl;
-        int number = 0;
         std::string received;
     };
 
@@ -92,9 +91,8 @@ struct TestHttpServer::Impl {
     SslContext tls;
     std::map<int, Connection> open; // by descriptor; server thread only
 
-    mutable std::mutex mutex;
-    std::condition_variable arrived;
-    std::condition_variable sent;
+    std::mutex mutex;
+    std::condition_variable changed;
     std::vector<Request> requests;   // under the mutex
     int connections = 0;             // under the mutex
     std::optional<Answer> sentToAll; // under the mutex
@@ -144,7 +142,7 @@ struct TestHttpServer::Impl {
         for (auto entry = open.begin(); sentToAll && entry != open.end();)
             entry = answer(entry->second, *sentToAll) ? std::next(entry) : open.erase(entry);
         sentToAll.reset();
-        sent.notify_all();
+        changed.notify_all();
         return !stopping;
     }
 
@@ -154,7 +152,7 @@ struct TestHttpServer::Impl {
         connection.socket = FileHandle(accept4(listener.fd(), nullptr, nullptr, SOCK_CLOEXEC));
         {
             std::lock_guard lock(mutex);
-            connection.number = ++connections;
+            ++connections;
         }
         if (tls) {
             connection.ssl.reset(SSL_new(tls.get()));
@@ -177,8 +175,7 @@ struct TestHttpServer::Impl {
             connection.received.append(chunk.data(), static_cast<std::size_t>(count));
         } while (connection.ssl && SSL_pending(connection.ssl.get()) > 0);
 
-        Request request{.connection = connection.number,
-                        .resumed = connection.ssl && SSL_session_reused(connection.ssl.get()) == 1};
+        Request request{.resumed = connection.ssl && SSL_session_reused(connection.ssl.get()) == 1};
         if (options.anyProtocol) {
             request.body = std::exchange(connection.received, {});
             return answer(connection, handler(request));
@@ -189,7 +186,7 @@ struct TestHttpServer::Impl {
                 std::lock_guard lock(mutex);
                 requests.push_back(request);
             }
-            arrived.notify_all();
+            changed.notify_all();
             if (!answer(connection, handler(request))) return false;
         }
         return true;
@@ -250,11 +247,6 @@ Url TestHttpServer::url(std::string_view target) const
                                    target));
 }
 
-std::uint16_t TestHttpServer::port() const
-{
-    return _impl->port;
-}
-
 int TestHttpServer::connections() const
 {
     std::lock_guard lock(_impl->mutex);
@@ -270,7 +262,7 @@ std::vector<TestHttpServer::Request> TestHttpServer::requests() const
 void TestHttpServer::waitForRequests(std::size_t count)
 {
     std::unique_lock lock(_impl->mutex);
-    _impl->arrived.wait(lock, [&] { return _impl->requests.size() >= count; });
+    _impl->changed.wait(lock, [&] { return _impl->requests.size() >= count; });
 }
 
 void TestHttpServer::sendToAll(const Answer& answer)
@@ -278,7 +270,7 @@ void TestHttpServer::sendToAll(const Answer& answer)
     std::unique_lock lock(_impl->mutex);
     _impl->sentToAll = answer;
     eventfd_write(_impl->wake.fd(), 1);
-    _impl->sent.wait(lock, [&] { return !_impl->sentToAll; });
+    _impl->changed.wait(lock, [&] { return !_impl->sentToAll; });
 }
 
 std::string httpAnswer(int status, std::string_view body, std::string_view fields)

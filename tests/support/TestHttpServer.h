@@ -1,7 +1,6 @@
 #pragma once
 
 #include <condition_variable>
-#include <cstdint>
 #include <functional>
 #include <map>
 #include <memory>
@@ -25,7 +24,6 @@ public:
         std::string target; ///< path and query, as sent
         std::string head;   ///< request line and header fields, with their line ends
         std::string body;
-        int connection = 0;   ///< number of its connection, from 1
         bool resumed = false; ///< the connection resumed an earlier TLS session
 
         /// Returns the value of the first field with exactly this name; empty if there is none.
@@ -53,7 +51,6 @@ public:
     ~TestHttpServer();
 
     [[nodiscard]] Url url(std::string_view target = "/") const;
-    [[nodiscard]] std::uint16_t port() const;
     [[nodiscard]] int connections() const;
     [[nodiscard]] std::vector<Request> requests() const;
     /// Blocks until `count` requests were received in total.
