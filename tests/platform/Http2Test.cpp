@@ -31,10 +31,12 @@ std::string frame(FrameType type, char flags, std::uint32_t stream, std::string_
     return frame.append(payload);
 }
 
-/// A server that answers when it has `count` requests, with bodies of `size` bytes whose frames are mixed at random.
+constexpr std::size_t kTransfers = 24, kSize = 20'000;
+
+/// A server that answers when it has all requests, with bodies whose frames are mixed at random.
 class MixedAnswers {
 public:
-    MixedAnswers(std::size_t count, std::size_t size, unsigned seed) : _count(count), _size(size), _random(seed) {}
+    explicit MixedAnswers(unsigned seed) : _random(seed) {}
 
     TestHttpServer::Answer operator()(const TestHttpServer::Request& request)
     {
@@ -46,11 +48,11 @@ public:
             answer = frame(kSettings, 0, 0);
         }
         while (_input.size() >= kFrameHeader && _input.size() >= kFrameHeader + number(0, 3)) {
-            if (_input[3] == kHeaders) _streams.push_back({number(5, 4), _size});
+            if (_input[3] == kHeaders) _streams.push_back({number(5, 4), kSize});
             if (_input[3] == kSettings && _input[4] != kAcknowledged) answer += frame(kSettings, kAcknowledged, 0);
             _input.erase(0, kFrameHeader + number(0, 3));
         }
-        if (_streams.size() == _count) answer += answers();
+        if (_streams.size() == kTransfers) answer += answers();
         return {answer};
     }
 
@@ -82,7 +84,6 @@ private:
         return all;
     }
 
-    const std::size_t _count, _size;
     std::minstd_rand _random;
     std::string _input;
     std::vector<Stream> _streams;
@@ -94,10 +95,8 @@ using Http2Test = test::UrlLoads;
 // unprocessed in one list of five.
 TEST_F(Http2Test, EveryTransferOfAListEndsHoweverTheFramesAreMixed)
 {
-    constexpr std::size_t kTransfers = 24, kSize = 20'000;
     for (unsigned seed = 0; seed < 40; ++seed) {
-        TestHttpServer server(MixedAnswers(kTransfers, kSize, seed),
-                              {.certificate = certificate(), .anyProtocol = true});
+        TestHttpServer server(MixedAnswers(seed), {.certificate = certificate(), .anyProtocol = true});
         const auto session =
             loader->makeSession({.requestTimeout = 5s, .pipelining = true, .caFile = certificate().certificate}, queue);
         std::vector<std::unique_ptr<Load>> loads;

@@ -17,9 +17,9 @@ std::string arrays(std::size_t depth)
     return std::string(depth, '[') + std::string(depth, ']');
 }
 
-TEST(Json, ReadsEdgeCasesExactly)
+TEST(Json, ReadsEdgeCasesExactlyAndWhatABrowserReads)
 {
-    const std::pair<std::string_view, Value> cases[]{
+    const std::pair<std::string, Value> cases[]{
         {"\xef\xbb\xbf[1]", Value::Array{1}},
         {R"({"a":1,"b":2,"a":3})", Value::dictionaryOf({{"a", 3}, {"b", 2}})},
         {"-0", 0},
@@ -36,17 +36,6 @@ TEST(Json, ReadsEdgeCasesExactly)
         {" null ", nullptr},
         {"[]", Value::Array{}},
         {"{}", Dictionary{}},
-    };
-    for (const auto& [text, expected] : cases) {
-        const auto value = parseJson(text);
-        ASSERT_TRUE(value) << text << ": " << value.error().description();
-        EXPECT_EQ(*value, expected) << text;
-    }
-}
-
-TEST(Json, ReadsWhatABrowserReads)
-{
-    const std::pair<std::string_view, Value> cases[]{
         {R"("\ud800")", "\xef\xbf\xbd"},
         {R"("a\uDC00\ud83d\ude00\ud83d\ud83d\uDE00\ud800\u0041\ud800")",
          "a\xef\xbf\xbd\xf0\x9f\x98\x80\xef\xbf\xbd\xf0\x9f\x98\x80\xef\xbf\xbd"
@@ -57,14 +46,13 @@ TEST(Json, ReadsWhatABrowserReads)
          Value::Array{std::numeric_limits<double>::max(), -std::numeric_limits<double>::max(), 0.0, 0.1, -1500.0,
                       UINT64_MAX, INT64_MIN, 7}},
         {"[18446744073709551616,-9223372036854775809]", Value::Array{18446744073709551616.0, -9223372036854775808.0}},
+        {"[" + std::string(400, '9') + "]", Value::Array{std::numeric_limits<double>::max()}},
     };
     for (const auto& [text, expected] : cases) {
         const auto value = parseJson(text);
         ASSERT_TRUE(value) << text << ": " << value.error().description();
         EXPECT_EQ(*value, expected) << text << " " << toJson(*value);
     }
-    const std::string manyDigits = "[" + std::string(400, '9') + "]";
-    EXPECT_EQ(parseJson(manyDigits).value()[0], Value(std::numeric_limits<double>::max()));
 }
 
 TEST(Json, RefusesWhatIsNotJsonWithAReason)
@@ -175,7 +163,7 @@ TEST(Json, KeepsNothingOfALargeDocumentForTheNextOne)
 
 TEST(Json, WritesEveryKindAsDocumented)
 {
-    const std::pair<Value, std::string_view> cases[]{
+    const std::pair<Value, std::string> cases[]{
         {nullptr, "null"},
         {true, "true"},
         {INT64_MIN, "-9223372036854775808"},
@@ -185,6 +173,7 @@ TEST(Json, WritesEveryKindAsDocumented)
         {std::numeric_limits<double>::infinity(), "null"},
         {std::numeric_limits<double>::quiet_NaN(), "null"},
         {Bytes("\xff\xfe\xfd\xfc"), "\"//79/A==\""},
+        {Bytes(std::string(10'000, '\0')), '"' + std::string(13'334, 'A') + "==\""}, // in chunks
         {dateFromSecondsSince1970(1.5), "1.5"},
         {std::string_view("a\"\\/\b\f\n\r\t\0\x1f\x7f\xc3\xa9", 14),
          "\"a\\\"\\\\/\\b\\f\\n\\r\\t\\u0000\\u001f\x7f\xc3\xa9\""},
@@ -198,11 +187,6 @@ TEST(Json, WritesEveryKindAsDocumented)
     }
     EXPECT_EQ(toJson(cases[std::size(cases) - 1].first, JsonStyle::Pretty),
               "{\n  \"z\": [\n    1,\n    null\n  ],\n  \"a\": {}\n}");
-}
-
-TEST(Json, BytesLongerThanOneChunkStayOneBase64Text)
-{
-    EXPECT_EQ(toJson(Bytes(std::string(10'000, '\0'))), '"' + std::string(13'334, 'A') + "==\"");
 }
 
 TEST(Json, DoublesSurviveTheRoundTrip)
