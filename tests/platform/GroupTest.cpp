@@ -1,6 +1,5 @@
 #include "platform/run/Group.h"
 
-#include <optional>
 #include <vector>
 
 #include <gtest/gtest.h>

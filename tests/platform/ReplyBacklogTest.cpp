@@ -5,8 +5,6 @@
 
 #include <gmock/gmock.h>
 
-#include "platform/values/Dictionary.h"
-#include "tests/support/ManualClock.h"
 #include "tests/support/ManualExecutor.h"
 #include "tests/support/ProbeService.h"
 

@@ -7,7 +7,7 @@
 
 #include <gtest/gtest.h>
 
-#include "platform/files/Files.h"
+#include "platform/base/FileHandle.h"
 #include "platform/run/Clock.h"
 #include "platform/run/SystemClock.h"
 #include "tests/support/TemporaryDirectory.h"
@@ -61,16 +61,6 @@ TEST_F(RunLoopTest, OtherThreadsWakeAndStopIt)
     }
     EXPECT_EQ(sum, 1500);
     EXPECT_FALSE(elsewhere);
-}
-
-TEST_F(RunLoopTest, JobsNeverRunAreDestroyed)
-{
-    auto held = std::make_shared<int>();
-    {
-        RunLoop brief;
-        brief.execute(Priority::Default, [held] {});
-    }
-    EXPECT_EQ(held.use_count(), 1);
 }
 
 TEST_F(RunLoopTest, WatchesFollowTheirDescriptorUntilTheyGo)

@@ -1,6 +1,5 @@
 #include <atomic>
 #include <fcntl.h>
-#include <unistd.h>
 
 #include <gtest/gtest.h>
 

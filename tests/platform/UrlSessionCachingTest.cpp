@@ -64,6 +64,14 @@ struct CachingSessionTest : testing::Test, test::ByHand {
         return load.wait();
     }
 
+    /// Cancels the load and returns how it ended.
+    Outcome cancelled(Load& load)
+    {
+        load.task->cancel();
+        executor.drain();
+        return load.wait();
+    }
+
     const std::unique_ptr<FileSystem> files = makeSystemFiles();
     test::TemporaryDirectory directory;
     std::shared_ptr<Queue> queue = makeQueue("test.delegate");
@@ -239,36 +247,26 @@ TEST_F(CachingSessionTest, CancelEndsATaskOnceWhereverItIs)
     auto asking = make();
     asking->task->resume();
     asking->task->cancel();
-    asking->task->cancel();
-    executor.drain();
-    EXPECT_EQ(asking->wait().code(), kUrlCancelled);
+    EXPECT_EQ(cancelled(*asking).code(), kUrlCancelled);
     EXPECT_TRUE(sent().empty());
 
     auto loading = start();
     EXPECT_EQ(sent().size(), 1u);
-    loading->task->cancel();
-    executor.drain();
-    EXPECT_EQ(loading->wait().code(), kUrlCancelled);
+    EXPECT_EQ(cancelled(*loading).code(), kUrlCancelled);
 
     auto answered = start();
     sent().at(0)->respond(200, "there first", kFresh);
-    answered->task->cancel();
-    executor.drain();
-    EXPECT_EQ(answered->wait().body(), "there first");
+    EXPECT_EQ(cancelled(*answered).body(), "there first");
 
     auto fromCache = make();
     fromCache->task->resume();
     cacheQueue->sync([] {}); // its answer waits on the delegate queue
-    fromCache->task->cancel();
-    executor.drain();
-    EXPECT_EQ(fromCache->wait().body(), "there first");
+    EXPECT_EQ(cancelled(*fromCache).body(), "there first");
 
     clock.advance(61s, [] {});
     auto confirming = start();
     sent().at(0)->respond(304, "", {{"ETag", "\"other\""}});
-    confirming->task->cancel(); // before it is known that it must be loaded again
-    executor.drain();
-    EXPECT_EQ(confirming->wait().code(), kUrlCancelled);
+    EXPECT_EQ(cancelled(*confirming).code(), kUrlCancelled) << "before it is known that it must be loaded again";
     EXPECT_TRUE(sent().empty());
 
     for (const auto* load : {&suspended, &asking, &loading, &answered, &fromCache, &confirming})

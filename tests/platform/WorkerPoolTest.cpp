@@ -44,7 +44,6 @@ struct WorkerPoolTest : testing::Test {
             done.count_down();
         };
     }
-    std::shared_ptr<Queue> makeQueue() { return Queue::make("test.queue", Queue::Kind::Serial, pool, clock); }
 
     test::ManualClock clock;
     std::mutex mutex;
@@ -94,32 +93,6 @@ TEST_F(WorkerPoolTest, OtherThreadsRunWhatAJobHandsOverEarlierAndWhatItShares)
     }
 }
 
-// Two threads of jobs that hand each other over for ever: nobody else would have a turn.
-TEST_F(WorkerPoolTest, JobsWithoutEndStarveNeitherOthersNorDescriptors)
-{
-    std::atomic<bool> goesOn = true;
-    std::latch ended(2);
-    std::function<void()> step = [&] {
-        if (!goesOn) return ended.count_down();
-        pool.execute(Priority::Default, [&] { step(); });
-    };
-    for (int i = 0; i < 2; ++i) pool.execute(Priority::Default, [&] { step(); });
-    run([] {});
-
-    std::array<int, 2> ends{};
-    ASSERT_EQ(socketpair(AF_UNIX, SOCK_STREAM, 0, ends.data()), 0);
-    const FileHandle in(ends[0]), out(ends[1]);
-    const auto queue = makeQueue();
-    std::promise<void> seen;
-    auto source = pool.watch(in.fd(), queue, [&](std::uint32_t) { seen.set_value(); });
-    queue->sync([&] { source->setEvents(EPOLLIN | EPOLLET); });
-    ASSERT_EQ(write(out.fd(), "x", 1), 1);
-    seen.get_future().wait();
-    queue->sync([&] { source.reset(); });
-    goesOn = false;
-    ended.wait();
-}
-
 /// A source on a queue, and the other end of its socket.
 struct SourceTest : WorkerPoolTest {
     SourceTest()
@@ -156,9 +129,27 @@ struct SourceTest : WorkerPoolTest {
 
     FileHandle in, out;
     std::atomic<int> calls = 0;
-    std::shared_ptr<Queue> queue = makeQueue();
+    std::shared_ptr<Queue> queue = Queue::make("test.queue", Queue::Kind::Serial, pool, clock);
     std::unique_ptr<WorkerPool::Source> source;
 };
+
+// Two threads of jobs that hand each other over for ever: nobody else would have a turn.
+TEST_F(SourceTest, JobsWithoutEndStarveNeitherOthersNorDescriptors)
+{
+    std::atomic<bool> goesOn = true;
+    std::latch ended(2);
+    std::function<void()> step = [&] {
+        if (!goesOn) return ended.count_down();
+        pool.execute(Priority::Default, [&] { step(); });
+    };
+    for (int i = 0; i < 2; ++i) pool.execute(Priority::Default, [&] { step(); });
+    run([] {});
+    watch(EPOLLIN | EPOLLET, [&](std::uint32_t) { call(); });
+    write("x");
+    await(1);
+    goesOn = false;
+    ended.wait();
+}
 
 TEST_F(SourceTest, TasksRunOnTheQueueAndReportUnreadBytesAgain)
 {
