@@ -10,7 +10,7 @@
 
 #include "platform/values/Json.h"
 #include "platform/values/Value.h"
-#include "tests/support/ManualClock.h"
+#include "tests/support/ByHand.h"
 #include "tests/support/MemoryFiles.h"
 
 namespace platform {
@@ -74,7 +74,7 @@ TEST(PrivacyLedger, NoDayHasMoreThanTheBudget)
     }
 }
 
-struct PrivacyRecorderTest : testing::Test {
+struct PrivacyRecorderTest : testing::Test, test::ByHand {
     Result<std::size_t> record(const Texts& texts, std::string_view key = "key.app")
     {
         return PrivacyRecorder(files, clock, directory, random).record(key, texts);
@@ -102,13 +102,8 @@ struct PrivacyRecorderTest : testing::Test {
         const PrivacyLedger ledger = PrivacyLedger::parse(contents("ledger")).value();
         return ledger.left(LivedTime(clock, ledger.time).now());
     }
-    void pass(Duration time)
-    {
-        clock.advance(time, [] {});
-    }
 
     test::MemoryFiles files;
-    test::ManualClock clock;
     std::mt19937_64 engine{7};
     RandomBytes random = [this](std::span<std::uint8_t> bytes) {
         std::ranges::generate(bytes, [this] { return static_cast<std::uint8_t>(engine()); });
@@ -122,7 +117,7 @@ TEST_F(PrivacyRecorderTest, TheBudgetIsOneForAllKeysAndComesBackADayLater)
     EXPECT_TRUE(record({}));
     EXPECT_TRUE(files.files.empty()) << "nothing costs nothing";
     EXPECT_TRUE(record(some(3)));
-    pass(23h);
+    advance(23h);
     EXPECT_TRUE(record(some(2), "key.other"));
     EXPECT_EQ(reports(), 5u);
     EXPECT_EQ(record(some(100)), 3u) << "of a hundred";
@@ -136,39 +131,25 @@ TEST_F(PrivacyRecorderTest, TheBudgetIsOneForAllKeysAndComesBackADayLater)
         EXPECT_EQ(refused.error().code, kPrivacyBudgetExhausted);
     }
     EXPECT_EQ(contents("reports.json"), before);
-    pass(1h - 1s);
+    advance(1h - 1s);
     EXPECT_FALSE(record(some(1)));
-    pass(1s);
+    advance(1s);
     EXPECT_EQ(left(), 3);
     EXPECT_TRUE(record(some(9)));
     EXPECT_EQ(reports(), 11u);
 }
 
-TEST_F(PrivacyRecorderTest, AClockThatIsSetBringsNothing)
+TEST_F(PrivacyRecorderTest, AClockThatIsSetBringsNothingAndCostsNothing)
 {
-    EXPECT_TRUE(record(some(8)));
-    for (const Duration back : {Duration(1s), Duration(24h), Duration(480'000h)}) {
-        clock.setWall(kNow - back);
-        EXPECT_FALSE(record(some(1)));
-    }
-    clock.suspend(24h);
-    EXPECT_TRUE(record(some(8)));
-    for (const Duration at : {Duration(0s), Duration(23h), Duration(480'000h)}) {
-        clock.setWall(kNow + at);
-        EXPECT_FALSE(record(some(1)));
-    }
-}
-
-TEST_F(PrivacyRecorderTest, ADebitWhileTheClockRanAheadCostsADayAndNotYears)
-{
-    for (const Duration ahead : {Duration(1h), Duration(24h * 90), Duration(24h * 365 * 20)}) {
+    for (const Duration ahead : {1h, 24h * 90, 24h * 365 * 20, -24h, -480'000h}) {
+        SCOPED_TRACE(toSeconds(ahead));
         files.files.clear();
         clock.setWall(kNow + ahead);
         EXPECT_TRUE(record(some(8)));
         clock.setWall(kNow);
-        EXPECT_FALSE(record(some(1))) << toSeconds(ahead);
-        pass(24h);
-        EXPECT_EQ(record(some(9)), 8u) << toSeconds(ahead);
+        EXPECT_FALSE(record(some(1)));
+        advance(24h);
+        EXPECT_EQ(record(some(9)), 8u);
     }
 }
 
@@ -238,15 +219,15 @@ TEST_F(PrivacyRecorderTest, ReportsAreKeptAMonthInNoOrderAndSayNeitherKeyNorText
     EXPECT_TRUE(std::ranges::is_sorted(bits));
     for (const auto& [path, text] : files.files) EXPECT_FALSE(text.contains("key") || text.contains("example")) << path;
 
-    pass(24h * 30);
+    advance(24h * 30);
     ASSERT_TRUE(record(some(1)));
     EXPECT_EQ(reports(), 9u);
-    pass(24h);
+    advance(24h);
     ASSERT_TRUE(record(some(1)));
     EXPECT_EQ(reports(), 2u);
 
     for (const char* broken : {"", "{}", "[", "[7]"}) {
-        pass(24h);
+        advance(24h);
         files.files[directory / "reports.json"] = broken;
         EXPECT_TRUE(record(some(1)));
         EXPECT_EQ(reports(), 1u) << broken;
@@ -257,7 +238,7 @@ TEST_F(PrivacyRecorderTest, ADeviceKeepsItsSecretAndChoosesAmongTextsByChance)
 {
     ASSERT_TRUE(record(some(1)));
     const auto secret = PrivacyLedger::parse(contents("ledger")).value().secret;
-    pass(24h);
+    advance(24h);
     ASSERT_TRUE(record(some(1)));
     EXPECT_EQ(PrivacyLedger::parse(contents("ledger")).value().secret, secret);
 
@@ -270,7 +251,7 @@ TEST_F(PrivacyRecorderTest, ADeviceKeepsItsSecretAndChoosesAmongTextsByChance)
     int set = 0;
     constexpr int kDays = 400;
     for (int day = 0; day < kDays; ++day) {
-        pass(24h);
+        advance(24h);
         ASSERT_TRUE(record(some(7)));
         files.files.erase(directory / "reports.json");
         ASSERT_TRUE(record({"a", other}, "key"));

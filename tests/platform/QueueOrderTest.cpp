@@ -5,16 +5,12 @@
 #include "platform/base/Mutex.h"
 #include "platform/run/Queue.h"
 #include "platform/run/RunLoop.h"
-#include "tests/support/ManualClock.h"
-#include "tests/support/ManualExecutor.h"
+#include "tests/support/ByHand.h"
 
 namespace platform {
 namespace {
 
-struct Queues {
-    test::ManualClock clock;
-    test::ManualExecutor executor;
-
+struct Queues : test::ByHand {
     std::shared_ptr<Queue> make(const char* label, Rank rank = Rank::None)
     {
         return Queue::make(label, Queue::Kind::Serial, executor, clock, rank);

@@ -31,22 +31,13 @@ int samples()
     return wanted ? std::max(1000, std::atoi(wanted)) : 20'000;
 }
 
-/// Devices and their randomness.
-class Source {
-public:
-    explicit Source(std::uint64_t seed) : _engine(seed) {}
-    DeviceSecret secret() { return filled<DeviceSecret>(); }
-    PrivacyRandom random() { return filled<PrivacyRandom>(); }
-
-private:
-    template <class Bytes> Bytes filled()
-    {
-        Bytes bytes;
-        std::ranges::generate(bytes, [this] { return static_cast<std::uint8_t>(_engine()); });
-        return bytes;
-    }
-    std::mt19937_64 _engine;
-};
+/// A device's secret, or the randomness of a report.
+template <class Bytes> Bytes drawn(std::mt19937_64& dice)
+{
+    Bytes bytes;
+    std::ranges::generate(bytes, [&] { return static_cast<std::uint8_t>(dice()); });
+    return bytes;
+}
 
 int count(const PrivacyBits& bits)
 {
@@ -66,12 +57,12 @@ TEST(RandomizedResponse, TurnsBitsOverAtTheRatesThatItsEpsilonIsDerivedFrom)
                      std::log(kTrueBitRate / kOtherBitRate) + std::log((1 - kOtherBitRate) / (1 - kTrueBitRate)));
     EXPECT_DOUBLE_EQ(kPermanentEpsilon, 2 * std::log((1 - kPrivacyFlip) / kPrivacyFlip));
 
-    Source source(1);
+    std::mt19937_64 dice(1);
     const int n = samples();
     double permanent = 0, instantaneous = 0, trueBits = 0, otherBits = 0;
     for (int i = 0; i < n; ++i) {
-        const DeviceSecret secret = source.secret();
-        const PrivacyRandom random = source.random();
+        const DeviceSecret secret = drawn<DeviceSecret>(dice);
+        const PrivacyRandom random = drawn<PrivacyRandom>(dice);
         const std::string text = "text " + std::to_string(i);
         permanent += count(permanentFlips(secret, kKey, text));
         instantaneous += count(flips(random));
@@ -88,9 +79,9 @@ TEST(RandomizedResponse, TurnsBitsOverAtTheRatesThatItsEpsilonIsDerivedFrom)
 
 TEST(RandomizedResponse, ManyReportsOfATextTellNoMoreThanItsPermanentResponse)
 {
-    Source source(2);
+    std::mt19937_64 dice(2);
     const int n = samples();
-    const DeviceSecret secret = source.secret();
+    const DeviceSecret secret = drawn<DeviceSecret>(dice);
     const unsigned cohort = privacyCohort(secret);
     PrivacyBits permanent = permanentFlips(secret, kKey, "text");
     const unsigned bit = privacyBit(cohort, kKey, "text");
@@ -98,7 +89,7 @@ TEST(RandomizedResponse, ManyReportsOfATextTellNoMoreThanItsPermanentResponse)
 
     std::array<int, kPrivacyBits> set{};
     for (int i = 0; i < n; ++i) {
-        const PrivacyReport report = privatised(secret, kKey, "text", source.random());
+        const PrivacyReport report = privatised(secret, kKey, "text", drawn<PrivacyRandom>(dice));
         ASSERT_EQ(report.cohort, cohort);
         for (unsigned each = 0; each < kPrivacyBits; ++each) set[each] += hasBit(report.bits, each);
     }
@@ -111,7 +102,7 @@ TEST(RandomizedResponse, ManyReportsOfATextTellNoMoreThanItsPermanentResponse)
     const PrivacyBits same = permanentFlips(secret, kKey, "text");
     EXPECT_NE(permanentFlips(secret, kKey, "texts"), same);
     EXPECT_NE(permanentFlips(secret, "other", "text"), same);
-    EXPECT_NE(permanentFlips(source.secret(), kKey, "text"), same);
+    EXPECT_NE(permanentFlips(drawn<DeviceSecret>(dice), kKey, "text"), same);
     EXPECT_NE(permanentFlips(secret, "ab", "c"), permanentFlips(secret, "a", "bc"));
 }
 
@@ -139,12 +130,12 @@ TEST(RandomizedResponse, AnyNumberOfReportsOfATextLosesNoMoreThanDerived)
 
 TEST(RandomizedResponse, SpreadsDevicesOverCohortsAndTextsOverBits)
 {
-    Source source(4);
+    std::mt19937_64 dice(4);
     constexpr int kTrials = 25'600;
     std::array<int, kPrivacyCohorts> cohorts{};
     std::array<int, kPrivacyBits> bits{};
     for (int i = 0; i < kTrials; ++i) {
-        ++cohorts.at(privacyCohort(source.secret()));
+        ++cohorts.at(privacyCohort(drawn<DeviceSecret>(dice)));
         ++bits.at(privacyBit(3, kKey, std::to_string(i)));
     }
     for (const int devices : cohorts) EXPECT_NEAR(devices, kTrials / 8, 6 * std::sqrt(kTrials / 8.0));

@@ -172,10 +172,7 @@ TEST(Record, UnknownKeysAreSkippedAndMissingOnesReadAsZero)
 
 TEST(Record, ErrorsNameTheField)
 {
-    struct {
-        Dictionary fields;
-        std::string_view reason;
-    } const cases[] = {
+    const std::pair<Dictionary, std::string_view> cases[] = {
         {{{"flag", 1}}, "flag: expected a boolean, found an integer"},
         {{{"small", "7"}}, "small: expected an integer, found a string"},
         {{{"small", 1.0}}, "small: expected an integer, found a double"},
@@ -196,10 +193,9 @@ TEST(Record, ErrorsNameTheField)
            Value::Array{Dictionary{{"class", "Part"}, {"inner", Dictionary{{"class", "Part"}, {"score", "x"}}}}}}},
          "parts[0].inner.score: expected a double, found a string"},
     };
-    for (const auto& c : cases) {
-        Dictionary fields = c.fields;
+    for (auto [fields, reason] : cases) {
         fields.set("class", "Longer");
-        EXPECT_EQ(reasonOf(recordFromValue(fields, classes())), c.reason);
+        EXPECT_EQ(reasonOf(recordFromValue(fields, classes())), reason);
     }
     EXPECT_EQ(reasonOf(recordFromValue(Value::Array(), classes())), "expected a record, found an array");
     EXPECT_EQ(recordFromValue(Dictionary{{"class", "Other"}}, classes()).error().code, Decoder::kUnknownClass);

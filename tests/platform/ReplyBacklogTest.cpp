@@ -5,21 +5,19 @@
 
 #include <gmock/gmock.h>
 
-#include "tests/support/ManualExecutor.h"
+#include "tests/support/ByHand.h"
 #include "tests/support/ProbeService.h"
 
 namespace platform::ipc {
 namespace {
 
 using namespace platform::ipc::test;
-using platform::test::ManualExecutor;
 using testing::ElementsAre;
 using testing::IsEmpty;
 
 TEST(ReplyBacklog, HoldsHandlersBackUntilThereIsRoom)
 {
-    ManualClock clock;
-    ManualExecutor executor;
+    platform::test::ByHand hand;
     ReplyBacklog backlog(100);
     std::vector<std::string> ran;
     const auto call = [&](const std::shared_ptr<Queue>& queue, const char* name, std::size_t answer) {
@@ -31,11 +29,11 @@ TEST(ReplyBacklog, HoldsHandlersBackUntilThereIsRoom)
         });
     };
     const auto newRuns = [&] {
-        executor.drain();
+        hand.drain();
         return std::exchange(ran, {});
     };
     std::vector<std::shared_ptr<Queue>> queues;
-    for (int i = 0; i < 4; ++i) queues.push_back(Queue::make("test", Queue::Kind::Serial, executor, clock));
+    for (int i = 0; i < 4; ++i) queues.push_back(hand.makeQueue("test"));
 
     call(queues[0], "first", 60);
     call(queues[0], "second", 60);

@@ -1,5 +1,6 @@
+#include <ranges>
+#include <regex>
 #include <set>
-#include <sstream>
 
 #include <fmt/format.h>
 #include <gtest/gtest.h>
@@ -65,22 +66,6 @@ TEST_F(TimingDataTest, MarksFollowTheOrderOfTheStages)
     }
 }
 
-/// The cells of every table row of the page, without backquotes.
-std::vector<std::vector<std::string>> rowsOf(const std::string& page)
-{
-    std::vector<std::vector<std::string>> rows;
-    std::istringstream lines(page);
-    for (std::string line; std::getline(lines, line);) {
-        if (!line.starts_with("| ")) continue;
-        std::erase(line, '`');
-        std::vector<std::string> cells;
-        for (std::size_t at = 2, end = 0; (end = line.find(" |", at)) != std::string::npos; at = end + 3)
-            cells.push_back(line.substr(at, end - at));
-        rows.push_back(std::move(cells));
-    }
-    return rows;
-}
-
 TEST_F(TimingDataTest, ALoadThatFailedSaysHowFarItCame)
 {
     TestHttpServer server(always({"", Then::Close}));
@@ -109,21 +94,25 @@ TEST_F(TimingDataTest, TheDocumentNamesEveryKeyAndTheBytesOfAnAddress)
 {
     const auto page = makeSystemFiles()->read(SOURCE_DIR "/docs/timing.md", 1 << 20);
     ASSERT_TRUE(page);
+    const std::string text(page->view());
+    const auto matches = [&](const std::regex& row) {
+        return std::ranges::subrange(std::sregex_iterator(text.begin(), text.end(), row), std::sregex_iterator());
+    };
     TestHttpServer server(always({httpAnswer(200)}));
     const Value timing = load(server.url()).timing;
     std::set<std::string> keys, documented;
     for (const auto& [key, value] : *timing.asDictionary()) keys.insert(key);
+    const std::regex key(R"(\| `(_kCFNTimingData\w+)` \|)"), example(R"(\| (\S+) \| (\d+) \| `([0-9a-f ]+)` \|)");
+    for (const std::smatch& row : matches(key)) documented.insert(row[1]);
+    EXPECT_EQ(documented, keys);
     int examples = 0;
-    for (const auto& row : rowsOf(std::string(page->view()))) {
-        if (row[0].starts_with("_kCFNTimingData")) documented.insert(row[0]);
-        const std::string bytes = socketAddress(row[0], atol(row[1].c_str()));
-        if (bytes.empty()) continue;
+    for (const std::smatch& row : matches(example)) {
         ++examples;
         std::string hex;
-        for (const unsigned char byte : bytes) hex += fmt::format("{}{:02x}", hex.empty() ? "" : " ", byte);
-        EXPECT_EQ(hex, row[2]) << row[0];
+        for (const unsigned char byte : socketAddress(row[1], std::stol(row[2])))
+            hex += fmt::format("{}{:02x}", hex.empty() ? "" : " ", byte);
+        EXPECT_EQ(hex, row.str(3)) << row.str(1);
     }
-    EXPECT_EQ(documented, keys);
     EXPECT_EQ(examples, 2);
 }
 
