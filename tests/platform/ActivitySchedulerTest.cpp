@@ -219,10 +219,8 @@ TEST_F(ActivitySchedulerTest, LeapsOfTheClockNeitherHoldBackNorHurry)
 
 TEST_F(ActivitySchedulerTest, StatesMoveOnOnly)
 {
-    const struct {
-        std::vector<std::pair<ActivityState, bool>> moves; ///< and whether each is accepted
-        Duration again;
-    } cases[]{
+    using Moves = std::vector<std::pair<ActivityState, bool>>; // and whether each is accepted
+    const std::pair<Moves, Duration> cases[]{
         {{}, 600s},
         {{{Done, true}, {Done, false}, {Continue, false}}, 600s},
         {{{Wait, false},
@@ -236,7 +234,7 @@ TEST_F(ActivitySchedulerTest, StatesMoveOnOnly)
         {{{Continue, true}, {Defer, true}, {Done, false}}, 300s},
         {{{Continue, true}}, 600s}, // and let go of
     };
-    for (const auto& c : cases) {
+    for (const auto& [moves, again] : cases) {
         int calls = 0;
         add("a", {.repeating = true, .interval = 600s}, [&](const auto& activity) {
             if (activity->state() == CheckIn) {
@@ -244,11 +242,11 @@ TEST_F(ActivitySchedulerTest, StatesMoveOnOnly)
                 return;
             }
             if (++calls > 1) return;
-            for (const auto& [state, accepted] : c.moves)
+            for (const auto& [state, accepted] : moves)
                 EXPECT_EQ(activity->setState(state), accepted) << static_cast<int>(state);
         });
         EXPECT_EQ(calls, 1);
-        advance(c.again - 1s);
+        advance(again - 1s);
         EXPECT_EQ(calls, 1);
         advance(1s);
         EXPECT_EQ(calls, 2);

@@ -230,7 +230,6 @@ TEST_F(FilesTest, ADateThatNoClockHoldsIsClamped)
 
 #if !defined(__SANITIZE_ADDRESS__) && !defined(__clang__) // the checks of sanitizers take descriptors of their own
 
-/// How many inotify instances this process has.
 int inotifyInstances()
 {
     int found = 0;

@@ -8,7 +8,6 @@
 #include <gtest/gtest.h>
 
 #include "platform/files/Files.h"
-#include "platform/net/HttpCacheStore.h"
 #include "platform/run/Queue.h"
 #include "tests/support/ByHand.h"
 #include "tests/support/FullDisk.h"
@@ -268,10 +267,8 @@ TEST_F(HttpCacheTest, ASecondProcessRunsWithoutTheDisk)
 
 TEST_F(HttpCacheTest, DamageIsDroppedAndNeverAnswered)
 {
-    const struct {
-        const char* what;
-        void (*spoil)(const fs::path&);
-    } cases[]{
+    using Spoil = void (*)(const fs::path&);
+    const std::pair<const char*, Spoil> cases[]{
         {"cut off", [](const fs::path& path) { fs::resize_file(path, 100); }},
         {"empty", [](const fs::path& path) { fs::resize_file(path, 0); }},
         {"gone", [](const fs::path& path) { fs::remove(path); }},
@@ -292,15 +289,15 @@ TEST_F(HttpCacheTest, DamageIsDroppedAndNeverAnswered)
              fs::create_symlink("/dev/zero", path);
          }},
     };
-    for (const auto& c : cases) {
+    for (const auto& [what, spoil] : cases) {
         for (const bool running : {true, false}) {
-            SCOPED_TRACE(fmt::format("{}, {}", c.what, running ? "running" : "restarted"));
+            SCOPED_TRACE(fmt::format("{}, {}", what, running ? "running" : "restarted"));
             open();
             store(1, kSmall);
             store(2, kLarge);
             EXPECT_EQ(find(2), kLarge);
             if (!running) cache.reset();
-            for (const fs::path& file : cacheFiles(false)) c.spoil(file);
+            for (const fs::path& file : cacheFiles(false)) spoil(file);
             if (!running) open();
             for (const int number : {1, 2}) {
                 const std::string found = find(number);
@@ -444,17 +441,6 @@ TEST_F(HttpCacheTest, AReadOnlyDirectoryIsReadAndNothingElse)
     EXPECT_EQ(log.count("can't be used"), 1);
     fs::permissions(directory / "http", fs::perms::owner_all);
     cache.reset();
-}
-
-TEST_F(HttpCacheTest, AnIndexOfOtherTablesIsBegunAnew)
-{
-    fs::create_directories(directory / "http");
-    ASSERT_TRUE(Sqlite::open(directory / "http/index.db")->execute("CREATE TABLE entry (id INTEGER, key TEXT)"));
-    open();
-    EXPECT_EQ(find(1), "(none)");
-    store(1, kSmall);
-    open();
-    EXPECT_EQ(find(1), kSmall);
 }
 
 } // namespace

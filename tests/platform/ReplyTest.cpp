@@ -61,16 +61,13 @@ TEST_F(ReplyTest, WhatFollowsRunsAfterTheAnswerAlone)
 
 TEST_F(ReplyTest, ItsOwnerMayGoWhileItAnswers)
 {
-    struct Owner {
-        Reply<> reply;
-    };
-    auto owner = std::make_unique<Owner>();
+    auto reply = std::make_unique<Reply<>>();
     bool answered = false;
-    owner->reply = Reply<>([&] {
-        owner.reset();
+    *reply = Reply<>([&] {
+        reply.reset();
         answered = true;
     });
-    owner->reply();
+    (*reply)();
     EXPECT_TRUE(answered);
 }
 

@@ -162,24 +162,22 @@ TEST_F(CurlLoaderTest, HeaderFieldsAreTrimmedAndKeepTheirOrder)
 
 TEST_F(CurlLoaderTest, RequestsGoOutAsAsked)
 {
-    const struct {
-        std::string method, body;
-    } cases[]{{"GET", ""},    {"GET", "a body"}, {"POST", ""}, {"POST", "posted"},
-              {"PUT", "put"}, {"DELETE", ""},    {"HEAD", ""}};
+    const std::pair<std::string, std::string> cases[]{
+        {"GET", ""}, {"GET", "a body"}, {"POST", ""}, {"POST", "posted"}, {"PUT", "put"}, {"DELETE", ""}, {"HEAD", ""}};
     TestHttpServer server([](const TestHttpServer::Request& request) {
         std::string answer = httpAnswer(200, "body", "Set-Cookie: a=b\r\n");
         if (request.method == "HEAD") answer.resize(answer.size() - 4);
         return Answer{answer};
     });
-    for (const auto& c : cases) {
+    for (const auto& [method, body] : cases) {
         const HttpHeaders headers{{"X-One", "a b"}, {"X-Empty", ""}, {"X-Bad", "1\r\nX-Injected: 1"}};
-        const Outcome outcome = load(
-            UrlRequest{.url = server.url("/p?q=%20+"), .method = c.method, .headers = headers, .body = Bytes(c.body)});
-        EXPECT_EQ(outcome.code(), 0) << c.method;
+        const Outcome outcome =
+            load(UrlRequest{.url = server.url("/p?q=%20+"), .method = method, .headers = headers, .body = Bytes(body)});
+        EXPECT_EQ(outcome.code(), 0) << method;
         const auto seen = server.requests().back();
-        EXPECT_EQ(seen.method, c.method);
+        EXPECT_EQ(seen.method, method);
         EXPECT_EQ(seen.target, "/p?q=%20+");
-        EXPECT_EQ(seen.body, c.body) << c.method;
+        EXPECT_EQ(seen.body, body) << method;
         EXPECT_EQ(seen.header("X-One"), "a b");
         EXPECT_TRUE(seen.head.contains("\r\nX-Empty:\r\n"));
         EXPECT_FALSE(seen.head.contains("X-Injected")) << "a line end in a value must not make a field";
@@ -533,7 +531,6 @@ TEST_F(CurlLoaderTest, CancelledTasksCompleteOnceWhenever)
     load(server.url("/end")); // the loader has seen all commands by now
     settle();
     EXPECT_EQ(before.completions() + running.completions() + after.completions(), 3);
-    for (const auto& request : server.requests()) EXPECT_NE(request.target, "") << "all were whole";
     EXPECT_EQ(server.requests().size(), 3u) << "the first was never sent, the second once";
 }
 
