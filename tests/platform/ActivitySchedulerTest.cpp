@@ -99,17 +99,14 @@ struct ActivitySchedulerTest : testing::Test, test::ByHand {
         scheduler.reset();
         executor.drain();
     }
-    [[nodiscard]] std::int64_t seconds() const
-    {
-        return std::chrono::duration_cast<std::chrono::seconds>(Duration(clock.hostTicks() - began)).count();
-    }
-    /// Registers an activity whose runs are noted; `act` is what its handler does.
+    /// Registers an activity whose runs are noted, with their second; `act` is what its handler does.
     void add(const std::string& name, const ActivityCriteria& criteria,
              std::function<void(const std::shared_ptr<Activity>&)> act = {})
     {
         scheduler->registerActivity(name, criteria, [this, act](const std::shared_ptr<Activity>& activity) {
             if (activity->state() == ActivityState::Run)
-                runs.push_back(fmt::format("{} {}", activity->identifier(), seconds()));
+                runs.push_back(
+                    fmt::format("{} {}", activity->identifier(), (clock.hostTicks() - began) / 1'000'000'000));
             if (act) act(activity);
         });
         advance(0s);

@@ -35,13 +35,6 @@ struct AppActivitiesTest : testing::Test {
         return names;
     }
     std::string all() { return appsIn(kStart - 240h, kStart); }
-    /// What `statements` make of the database.
-    void alter(const char* statements)
-    {
-        auto database = Sqlite::open(file, Sqlite::Access::Shared).value();
-        const auto done = database.execute(statements);
-        ASSERT_TRUE(done) << done.error().description();
-    }
 
     test::TemporaryDirectory directory;
     const fs::path file = directory / "knowledge/app-activities.db";
@@ -138,7 +131,7 @@ TEST_F(AppActivitiesTest, ADatabaseOfAnotherMakeIsAnErrorWhateverItHolds)
         {"PRAGMA user_version = 2", false},
     };
     for (const auto& [statements, readable] : cases) {
-        alter(statements);
+        ASSERT_TRUE(Sqlite::open(file, Sqlite::Access::Shared)->execute(statements)) << statements;
         EXPECT_EQ(store.queryAppActivitiesAfterDate(kStart - 24h, kStart, 100).has_value(), readable) << statements;
     }
     EXPECT_FALSE(store.add(activity("a", 0s), kStart)) << "what another version keeps is not ours to change";

@@ -33,7 +33,7 @@ struct SystemBusTest : testing::Test {
                             "</listen><policy context=\"default\"><allow send_destination=\"*\"/><allow own=\"*\"/>"
                             "<allow user=\"*\"/><allow receive_sender=\"*\"/></policy></busconfig>");
         startBus();
-        useBus("unix:path=" + (directory / "bus").string());
+        setenv("DBUS_SYSTEM_BUS_ADDRESS", ("unix:path=" + (directory / "bus").string()).c_str(), 1);
     }
     void startBus()
     {
@@ -61,7 +61,6 @@ struct SystemBusTest : testing::Test {
         stopBus();
         unsetenv("DBUS_SYSTEM_BUS_ADDRESS");
     }
-    static void useBus(const std::string& address) { setenv("DBUS_SYSTEM_BUS_ADDRESS", address.c_str(), 1); }
 
     void serve(const char* name)
     {

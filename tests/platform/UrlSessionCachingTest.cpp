@@ -171,8 +171,7 @@ TEST_F(CachingSessionTest, StaleAnswersAreConfirmed)
     clock.advance(9s, [] {});
     EXPECT_EQ(start()->wait().body(), "one") << "fresh again";
     clock.advance(1s, [] {});
-    auto replaced = start();
-    EXPECT_EQ(answer(*replaced, 200, "two", kFresh).body(), "two");
+    EXPECT_EQ(answer(*start(), 200, "two", kFresh).body(), "two");
     EXPECT_EQ(start()->wait().body(), "two");
 
     // An answer that confirms something else is asked for once more, without a condition.
@@ -192,8 +191,7 @@ TEST_F(CachingSessionTest, StaleAnswersAreConfirmed)
 
     (void)answer(*start(), 200, "four", kFresh);
     clock.advance(60s, [] {});
-    auto last = start();
-    EXPECT_EQ(answer(*last, 304, "", {{"Cache-Control", "no-store, max-age=60"}}).body(), "four");
+    EXPECT_EQ(answer(*start(), 304, "", {{"Cache-Control", "no-store, max-age=60"}}).body(), "four");
     EXPECT_FALSE(cache->find(kUrl)) << "from now on it may not be kept";
 }
 
@@ -279,27 +277,24 @@ TEST_F(CachingSessionTest, CancelEndsATaskOnceWhereverItIs)
 
 /// With the real loader, a service on loopback, and threads.
 struct CachingLoaderTest : test::UrlLoads {
-    const std::unique_ptr<FileSystem> files = makeSystemFiles();
-    [[nodiscard]] UrlSessionConfiguration configuration(std::size_t memory)
-    {
-        return {.cache = HttpCacheConfiguration{.memoryCapacity = memory,
-                                                .directory = directory / "http",
-                                                .files = files.get(),
-                                                .queue = cacheQueue,
-                                                .clock = &clock}};
-    }
     ~CachingLoaderTest() override
     {
         cacheQueue->sync([] {}); // what waits keeps the cache
     }
     test::TemporaryDirectory directory;
+    const std::unique_ptr<FileSystem> files = makeSystemFiles();
     std::shared_ptr<Queue> cacheQueue = Queue::make("test.httpCache", Queue::Kind::Serial, pool, clock);
+    const UrlSessionConfiguration configuration{.cache = HttpCacheConfiguration{.memoryCapacity = 0,
+                                                                                .directory = directory / "http",
+                                                                                .files = files.get(),
+                                                                                .queue = cacheQueue,
+                                                                                .clock = &clock}};
 };
 
 TEST_F(CachingLoaderTest, SessionsOfTheRealLoaderHaveTheCacheThatTheyAskFor)
 {
     TestHttpServer server(test::always({httpAnswer(200, "image", "Cache-Control: max-age=60\r\n")}));
-    const auto session = loader->makeSession(configuration(0), queue);
+    const auto session = loader->makeSession(configuration, queue);
     for (int i = 0; i < 2; ++i) {
         Load load(*session, {.url = server.url("/image")}, queue);
         load.task->resume();
@@ -316,7 +311,7 @@ TEST_F(CachingLoaderTest, ACancelThatRacesWithTheRestIsNeverLostOrDoubled)
                                         {"/1", {httpAnswer(200, "old", "ETag: \"1\"\r\n")}},
                                         {"/2", {""}}}));
     const auto codes =
-        raceWithCancel(configuration(0), 150, [&](int i) { return server.url("/" + std::to_string(i % 3)); });
+        raceWithCancel(configuration, 150, [&](int i) { return server.url("/" + std::to_string(i % 3)); });
     for (std::size_t i = 0; i < codes.size(); ++i)
         EXPECT_TRUE(codes[i] == kUrlCancelled || (codes[i] == 0 && i % 3 != 2)) << i << ": " << codes[i];
 }

@@ -529,7 +529,7 @@ TEST_F(CurlLoaderTest, CancelledTasksCompleteOnceWhenever)
     after.task->cancel();
 
     load(server.url("/end")); // the loader has seen all commands by now
-    settle();
+    queue->sync([] {});       // every completion has run
     EXPECT_EQ(before.completions() + running.completions() + after.completions(), 3);
     EXPECT_EQ(server.requests().size(), 3u) << "the first was never sent, the second once";
 }
@@ -551,7 +551,7 @@ TEST_F(CurlLoaderTest, DestroyingTheLoaderCancelsWhatIsUnderWay)
     server.waitForRequests(1);
     loader.reset();
     EXPECT_EQ(sent.wait().code(), kUrlCancelled);
-    settle();
+    queue->sync([] {}); // every completion has run
     EXPECT_EQ(neverResumed.completions(), 0);
 }
 

@@ -76,7 +76,7 @@ std::vector<std::int64_t> UrlLoads::raceWithCancel(const UrlSessionConfiguration
     std::vector<std::int64_t> codes;
     for (const auto& one : loads) codes.push_back(one->wait().code());
     loader.reset();
-    settle();
+    queue->sync([] {}); // every completion has run
     for (const auto& one : loads) EXPECT_EQ(one->completions(), 1);
     return codes;
 }
@@ -88,11 +88,6 @@ const tavrin::tools::CertificateFiles& UrlLoads::certificate()
         tavrin::tools::provideCertificate(directory / "certificate", "127.0.0.1", std::chrono::system_clock::now())
             .value();
     return files;
-}
-
-void UrlLoads::settle()
-{
-    queue->sync([] {});
 }
 
 } // namespace platform::test

@@ -69,8 +69,6 @@ struct UrlLoads : testing::Test {
                                              const std::function<Url(int)>& url);
     /// A certificate for servers on loopback; its file is what clients must trust.
     static const tavrin::tools::CertificateFiles& certificate();
-    /// Lets every completion that is due run.
-    void settle();
 
     ManualClock clock;
     WorkerPool pool{2};
