@@ -72,7 +72,6 @@ struct SystemLocale : testing::Test {
         for (const char* variable : kVariables) unsetenv(variable);
     }
     std::unique_ptr<LocaleSource> make() { return makeLocaleSource(loop, etc.path); }
-    void dispatch() { loop.runOnce(std::chrono::milliseconds(0)); }
 
     test::TemporaryDirectory etc;
     RunLoop loop;
@@ -103,7 +102,7 @@ TEST_F(SystemLocale, ChangesOfTheSystemAreToldOnceEach)
     source->onChange(
         [&](LocaleSource::Change change) { ++(change == LocaleSource::Change::Locale ? locales : zones); });
     EXPECT_EQ(source->locale().identifier, "de_DE") << "the login made its environment from the files";
-    dispatch(); // the watches are there now
+    loop.runOnce(std::chrono::milliseconds(0)); // the watches are there now
 
     writeFile(etc / "locale.conf", "# by hand\nLC_TIME=xx\nLANG=\"it_CH.UTF-8\"\nLANGUAGE=it:rm\n");
     EXPECT_TRUE(runUntil(loop, [&] { return locales == 1; }));

@@ -1,7 +1,6 @@
 #include "platform/privacy/PrivacyRecorder.h"
 
 #include <algorithm>
-#include <array>
 #include <cerrno>
 #include <cmath>
 #include <random>

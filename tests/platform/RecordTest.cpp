@@ -102,13 +102,13 @@ template <class T> std::string reasonOf(const Result<T>& result)
     return result ? "" : result.error().reason();
 }
 
+/// Texts of MessagePack, in which a letter that follows an escape would belong to it.
+const std::string kClassKey = std::string("\xa5") + "class", kPartName = std::string("\xa4") + "Part";
+
 /// A MessagePack map with the class and one more entry, given as its raw bytes.
 std::string partWith(std::string_view entry)
 {
-    return std::string("\x82\xa5"
-                       "class\xa4"
-                       "Part") +
-           std::string(entry);
+    return "\x82" + kClassKey + kPartName + std::string(entry);
 }
 
 TEST(Record, EveryFieldSurvivesBothEncodings)
@@ -136,10 +136,8 @@ TEST(Record, EveryFieldSurvivesBothEncodings)
 TEST(Record, NullFieldsAreLeftOut)
 {
     EXPECT_EQ(toValue(Part()), Value::dictionaryOf({{"class", "Part"}, {"score", 0.0}}));
-    EXPECT_EQ(archive(Part()), std::string("\xde\0\2\xa5"
-                                           "class\xa4"
-                                           "Part\xa5score\xcb\0\0\0\0\0\0\0\0",
-                                           29));
+    EXPECT_EQ(archive(Part()),
+              std::string("\xde\0\2", 3) + kClassKey + kPartName + std::string("\xa5score\xcb\0\0\0\0\0\0\0\0", 15));
     const Value whole = toValue(Whole());
     EXPECT_EQ(whole["names"], Value(Value::Array()));
     EXPECT_FALSE(whole.asDictionary()->contains("list"));
@@ -164,9 +162,7 @@ TEST(Record, UnknownKeysAreSkippedAndMissingOnesReadAsZero)
     const Value value =
         Value::dictionaryOf({{"new", Value::Array{1, Dictionary{{"x", 2}}}}, {"score", 3}, {"class", "Part"}});
     EXPECT_EQ(std::dynamic_pointer_cast<Part>(recordFromValue(value, classes()).value())->score, 3);
-    const std::string later = std::string("\x83\xa5"
-                                          "class\xa4"
-                                          "Part\xa3new\x92\x01\x81\xa1x\x02\xa5score\x03");
+    const std::string later = "\x83" + kClassKey + kPartName + "\xa3new\x92\x01\x81\xa1x\x02\xa5score\x03";
     EXPECT_EQ(std::dynamic_pointer_cast<Part>(unarchive(later, classes()).value())->score, 3);
 }
 
@@ -208,9 +204,7 @@ TEST(Record, BrokenArchivesAreRefusedWithAReason)
         {"", "truncated"},
         {archive(Part()) + '\0', "trailing bytes"},
         {"\xdd\xff\xff\xff\xff\x01\x01\x01\x01\x01", "truncated"},
-        {"\xdf\xff\xff\xff\xff\xa5"
-         "class",
-         "truncated"},
+        {"\xdf\xff\xff\xff\xff" + kClassKey, "truncated"},
         {partWith("\xa5inner\xdb\xff\xff\xff\xff"), "inner: truncated"},
         {partWith("\xa5inner\xc6\xff\xff\xff\xff"), "inner: truncated"},
         {partWith("\xa1x\xc9\xff\xff\xff\xff\xff"), "x: truncated"},
@@ -218,13 +212,8 @@ TEST(Record, BrokenArchivesAreRefusedWithAReason)
         {"\x90", "expected a record, found an array"},
         {"\x80", "record without a class"},
         {"\x81\xa5score\x01", "record without a class"},
-        {"\x81\xa5"
-         "class\x01",
-         "expected a class name, found an integer"},
-        {"\x81\xa5"
-         "class\xa3"
-         "Pot",
-         "unknown class Pot"},
+        {"\x81" + kClassKey + "\x01", "expected a class name, found an integer"},
+        {"\x81" + kClassKey + "\xa3Pot", "unknown class Pot"},
         {partWith("\x01\x02"), "expected a key, found an integer"},
         {partWith("\xa5score\xa1x"), "score: expected a double, found a string"},
         {partWith("\xa5inner\x90"), "inner: expected a record, found an array"},
@@ -246,11 +235,7 @@ TEST(Record, ReadsEveryWidthOfDate)
         {"\xc7\x0c\xff\0\0\0\x01\xff\xff\xff\xff\xff\xff\xff\xff"s, std::chrono::seconds(-1) + Duration(1)},
     };
     for (const auto& [bytes, expected] : cases) {
-        const auto record = unarchive("\x82\xa5"
-                                      "class\xa5Whole\xa4"
-                                      "date" +
-                                          bytes,
-                                      classes());
+        const auto record = unarchive("\x82" + kClassKey + "\xa5Whole\xa4" + "date" + bytes, classes());
         ASSERT_TRUE(record) << record.error().description();
         EXPECT_EQ(std::static_pointer_cast<Whole>(*record)->date.time_since_epoch(), expected);
     }

@@ -20,8 +20,6 @@
 namespace platform {
 namespace {
 
-using namespace std::chrono_literals;
-
 struct WorkerPoolTest : testing::Test {
     /// Runs the job on a worker, and returns when it has ended.
     void run(Executor::Job job, Priority priority = Priority::Default)

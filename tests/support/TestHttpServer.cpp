@@ -1,11 +1,12 @@
 #include "tests/support/TestHttpServer.h"
 
 #include <array>
-#include <charconv>
 #include <csignal>
+#include <cstdlib>
 #include <netdb.h>
 #include <netinet/in.h>
 #include <poll.h>
+#include <sstream>
 #include <sys/eventfd.h>
 #include <sys/socket.h>
 #include <thread>
@@ -52,14 +53,10 @@ std::size_t requestLength(const std::string& bytes, TestHttpServer::Request& req
     const std::size_t end = bytes.find("\r\n\r\n");
     if (end == std::string::npos) return 0;
     request.head = bytes.substr(0, end + 2);
-    const std::string length = request.header("Content-Length");
-    std::size_t bodyLength = 0;
-    std::from_chars(length.data(), length.data() + length.size(), bodyLength);
+    const std::size_t bodyLength = std::strtoul(request.header("Content-Length").c_str(), nullptr, 10);
     const std::size_t whole = end + 4 + bodyLength;
     if (bytes.size() < whole) return 0;
-    const std::size_t space = request.head.find(' ');
-    request.method = request.head.substr(0, space);
-    request.target = request.head.substr(space + 1, request.head.find(' ', space + 1) - space - 1);
+    std::istringstream(request.head) >> request.method >> request.target;
     request.body = bytes.substr(end + 4, bodyLength);
     return whole;
 }
