@@ -142,10 +142,10 @@ TEST(UrlComponents, ItemsAreReadInOrder)
 TEST(UrlComponents, ItemsOfOursCannotBreakOutOfTheQuery)
 {
     UrlComponents components(*Url::parse("http://h/p?old#f"));
-    const std::vector<QueryItem> items{{"q", "a&b=c#d"}, {"n=m", "c++ ü"}, {"bare"}, {"empty", ""}};
-    components.setQueryItems(items);
+    components.setQueryItems({{"q", "a&b=c#d"}, {"n=m", "c++ ü"}, {"bare"}, {"empty", ""}});
     EXPECT_EQ(components.url().string(), "http://h/p?q=a%26b%3Dc%23d&n%3Dm=c%2B%2B%20%C3%BC&bare&empty=#f");
-    EXPECT_EQ(UrlComponents(components.url()).queryItems(), items);
+    EXPECT_EQ(components.url().queryValue("q"), "a&b=c#d");
+    EXPECT_EQ(components.url().queryValue("n=m"), "c++ ü");
     components.setQueryItems({});
     EXPECT_EQ(components.url().string(), "http://h/p#f");
 }
