@@ -127,6 +127,7 @@ TEST_F(SearchTest, TransportErrorsReachTheClientAndTheSession)
     auto call = search(*connection, 1, "weat");
     lastTask()->fail(platform::Error::withReason("UrlErrorDomain", -1004, "refused"));
     device.drain();
+    EXPECT_EQ(call->argument(1).count(), 0u);
     EXPECT_EQ(reasonOf(*call), "refused");
     EXPECT_EQ(counter("Vistrel/4.noconnection"), 1);
     EXPECT_EQ(counter("Vistrel/4.fedapicall.serverstatus.0"), 0);
