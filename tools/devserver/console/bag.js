@@ -1,7 +1,7 @@
 // The bag to edit. The daemon's own code names its problems; a bag with problems can be applied, to see what clients make of it.
 
 import { get, post } from "/console/control.js";
-import { byId, element, explained, say, settled } from "/console/dom.js";
+import { byId, element, explained, perform, say, settled } from "/console/dom.js";
 import { bagKeys } from "/console/documents.js";
 
 export function showBag() {
@@ -28,17 +28,12 @@ export function showBag() {
     }
   }
 
-  async function load(words = "") {
-    try {
-      const answer = await get("bag");
-      loaded = answer.bag;
-      text.value = textOf(loaded);
-      show(answer.problems);
-      say(said, words);
-    } catch (error) {
-      say(said, error.message, true);
-    }
-  }
+  const load = (words = "") => perform(said, async () => {
+    const answer = await get("bag");
+    loaded = answer.bag;
+    text.value = textOf(loaded);
+    show(answer.problems);
+  }, words);
 
   /** What differs from the loaded bag; null removes a key. */
   function differences(bag) {
@@ -48,23 +43,17 @@ export function showBag() {
     return changed;
   }
 
-  async function perform(work) {
-    try {
-      const words = await work();
-      await load(words);
-    } catch (error) {
-      say(said, error.message, true);
-    }
-  }
-
   text.addEventListener("input", settled(check, 300));
-  apply.addEventListener("click", () => perform(async () => {
+  apply.addEventListener("click", () => perform(said, async () => {
     const changed = differences(JSON.parse(text.value));
     await post("bag", changed);
-    return `applied: ${Object.keys(changed).join(", ") || "no change"}`;
+    await load(`applied: ${Object.keys(changed).join(", ") || "no change"}`);
   }));
   byId("bag-revert").addEventListener("click", () => load());
-  byId("bag-bump").addEventListener("click", () => perform(async () => `version ${(await post("bag/bump")).version}: the next search announces it`));
+  byId("bag-bump").addEventListener("click", () => perform(said, async () => {
+    const { version } = await post("bag/bump");
+    await load(`version ${version}: the next search announces it`);
+  }));
   bagKeys().then((keys) => byId("bag-keys").append(...explained(keys)));
 
   return {

@@ -1,28 +1,19 @@
 // What was received, counted and refused, and the service's other settings.
 
 import { post } from "/console/control.js";
-import { byId, element, say } from "/console/dom.js";
+import { byId, element, perform } from "/console/dom.js";
 
 export function showBooks() {
   const said = byId("books-said");
   const age = byId("books-age-value");
 
-  async function perform(work, done) {
-    try {
-      await work();
-      say(said, done);
-    } catch (error) {
-      say(said, error.message, true);
-    }
-  }
-
   byId("books-age").addEventListener("submit", (event) => {
     event.preventDefault();
-    perform(() => post("search", { max_age: Number(age.value) }), `sets are fresh for ${age.value} s`);
+    perform(said, () => post("search", { max_age: Number(age.value) }), `sets are fresh for ${age.value} s`);
   });
-  byId("books-resources").addEventListener("click", () => perform(() => post("resources/bump"), "a new bag will list them"));
+  byId("books-resources").addEventListener("click", () => perform(said, () => post("resources/bump"), "a new bag will list them"));
   byId("books-reset").addEventListener("click", () => {
-    if (confirm("Removes faults, changes of the bag, the log and all uploads. Continue?")) perform(() => post("reset"), "reset");
+    if (confirm("Removes faults, changes of the bag, the log and all uploads. Continue?")) perform(said, () => post("reset"), "reset");
   });
 
   return {

@@ -36,6 +36,18 @@ export function say(line, text, failed = false) {
   line.classList.toggle("failed", failed);
 }
 
+/** Does some work; says `done` in a status line if there is such a text, or the error. Returns whether the work succeeded. */
+export async function perform(line, work, done) {
+  try {
+    await work();
+    if (done !== undefined) say(line, done);
+    return true;
+  } catch (error) {
+    say(line, error.message, true);
+    return false;
+  }
+}
+
 export const clock = (seconds) => new Date(seconds * 1000).toTimeString().slice(0, 8);
 export const milliseconds = (value) => (value < 10 ? value.toFixed(2) : value < 1000 ? value.toFixed(0) : `${(value / 1000).toFixed(1)}k`);
 

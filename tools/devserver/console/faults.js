@@ -1,7 +1,7 @@
 // Switches faults of the service.
 
 import { post } from "/console/control.js";
-import { byId, element, say } from "/console/dom.js";
+import { byId, element, perform } from "/console/dom.js";
 import { faultKinds } from "/console/documents.js";
 
 /** A number to begin with for each unit. */
@@ -17,25 +17,14 @@ export function showFaults() {
     byId("faults-explained").textContent = `The service ${fault.text}.`;
   }
 
-  async function perform(work, done) {
-    try {
-      await work();
-      say(said, done);
-      text.removeAttribute("aria-invalid");
-    } catch (error) {
-      say(said, error.message, true);
-    }
-  }
-
   kind.addEventListener("change", chosen);
-  byId("faults-form").addEventListener("submit", (event) => {
+  byId("faults-form").addEventListener("submit", async (event) => {
     event.preventDefault();
-    text.setAttribute("aria-invalid", "true");
-    perform(() => post("faults", { endpoint: byId("faults-endpoint").value, fault: text.value, count: Number(byId("faults-count").value) }),
-      `${text.value} is on`);
+    const fault = { endpoint: byId("faults-endpoint").value, fault: text.value, count: Number(byId("faults-count").value) };
+    text.setAttribute("aria-invalid", !await perform(said, () => post("faults", fault), `${fault.fault} is on`));
   });
-  byId("faults-clear").addEventListener("click", () => perform(() => post("faults/clear"), "all faults are off"));
-  byId("faults-release").addEventListener("click", () => perform(() => post("release"), "held requests were released"));
+  byId("faults-clear").addEventListener("click", () => perform(said, () => post("faults/clear"), "all faults are off"));
+  byId("faults-release").addEventListener("click", () => perform(said, () => post("release"), "held requests were released"));
   faultKinds().then((known) => {
     kinds = known;
     kind.replaceChildren(...kinds.map(({ name }) => element("option", { value: name }, name)));
