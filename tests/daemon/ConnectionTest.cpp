@@ -384,8 +384,10 @@ TEST_F(RecordedConnectionTest, EveryEventAndEverySearchNoticesAStaleBag)
     }
 }
 
-TEST(Logging, ACategoryOutOfRangeIsAProgrammingError)
+TEST(Logging, CategoriesHaveTheirNamesAndOneOutOfRangeIsAProgrammingError)
 {
+    EXPECT_EQ(TavrinLogForCategory(kLogGeneral).category(), "Tavrin");
+    EXPECT_EQ(TavrinLogForCategory(kLogFeedbackStorage).category(), "Tavrin_Feedback_Storage");
     EXPECT_DEATH((void)TavrinLogForCategory(19), "category < TavrinLoggingCategoryCount");
 }
 

@@ -21,6 +21,10 @@ TEST_F(StartupTest, EachSessionLoadsWithinItsLimits)
         EXPECT_EQ(configuration.maximumResponseSize, 8u << 20);
         EXPECT_EQ(configuration.allowFastOpenAndTickets, forSearches);
         EXPECT_EQ(configuration.pipelining, forSearches);
+        if (!forSearches) continue;
+        EXPECT_EQ(configuration.cache->memoryCapacity, 1u << 20);
+        EXPECT_EQ(configuration.cache->diskCapacity, 100u << 20);
+        EXPECT_EQ(configuration.cache->minimumMappedSize, 16u << 10);
     }
 
     for (const auto& [identifier, loads] : device.background.loads)
