@@ -33,7 +33,7 @@ if(TAVRIND_SANITIZE)
   target_link_options(house INTERFACE -fsanitize=${TAVRIND_SANITIZE})
 endif()
 if(TAVRIND_FUZZ)
-  add_compile_options(-fsanitize=fuzzer-no-link) # an option of folders, so that some can do without it
+  add_compile_options(-fsanitize=fuzzer-no-link) # per folder: compile_quickly() takes it back
 endif()
 if(CMAKE_CXX_COMPILER_ID STREQUAL "Clang")
   # Without a timestamp the precompiled header is the same in every tree, so that ccache can cache the sources that use it.
@@ -56,8 +56,9 @@ function(precompile name)
 endfunction()
 precompile(house_headers)
 
-# compile_quickly(<name> [headers…]): precompiles headers for targets that no fuzz target runs. With sanitizers they are not
-# optimised and, for the fuzzer, not counted: compiling them takes a third of the time.
+# compile_quickly(<name> [headers…]): precompiles headers for the targets of this folder and those below, none of which is the code
+# under test of a fuzz target. With sanitizers they are built without optimisation and without the fuzzer's coverage counters:
+# compiling them takes a third of the time.
 macro(compile_quickly)
   if(TAVRIND_SANITIZE)
     add_compile_options(-O0 $<$<BOOL:${TAVRIND_FUZZ}>:-fno-sanitize=fuzzer-no-link>)

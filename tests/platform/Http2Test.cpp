@@ -33,7 +33,7 @@ std::string frame(FrameType type, char flags, std::uint32_t stream, std::string_
 
 constexpr std::size_t kTransfers = 24, kSize = 20'000;
 
-/// A server that answers when it has all requests, with bodies whose frames are mixed at random.
+/// A server that waits for all requests, then sends the bodies with their frames mixed at random.
 class MixedAnswers {
 public:
     explicit MixedAnswers(unsigned seed) : _random(seed) {}

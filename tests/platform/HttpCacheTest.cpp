@@ -64,7 +64,7 @@ struct HttpCacheTest : testing::Test, test::ByHand {
         return found;
     }
     [[nodiscard]] std::size_t bodyFiles() const { return cacheFiles(true).size(); }
-    /// Notes the first letters of what is found, or "-", then calls `next`.
+    /// Looks up a response, appends the first three letters of its body, or "-", to `seen`, then calls `next`.
     void lookUp(int number, const std::function<void()>& next = [] {})
     {
         cache->lookUp(url(number), [this, next](auto found) {

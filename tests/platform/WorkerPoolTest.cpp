@@ -131,7 +131,7 @@ struct SourceTest : WorkerPoolTest {
     std::unique_ptr<WorkerPool::Source> source;
 };
 
-// Two threads of jobs that hand each other over for ever: nobody else would have a turn.
+// Two endless chains: each job queues the next, so that other work might never get a turn.
 TEST_F(SourceTest, JobsWithoutEndStarveNeitherOthersNorDescriptors)
 {
     std::atomic<bool> goesOn = true;

@@ -66,9 +66,9 @@ struct DaemonTest : testing::Test {
         answer(*lastTask(), std::move(body), status, std::move(headers));
     }
     void answer(Task& task, std::string body, int status = 200, platform::HttpHeaders headers = {});
-    /// Answers the bag requests that are under way.
+    /// Answers each bag request that is under way with `body`.
     void deliverBag(const std::string& body = kBag);
-    /// Makes the bag stale, and asks for it, which begins the fetch of another.
+    /// Makes the bag stale and asks for it: the daemon then fetches a new one.
     void expireBag();
 
     std::shared_ptr<FakeConnection> connect(pid_t pid = 77);
@@ -86,7 +86,7 @@ struct DaemonTest : testing::Test {
     std::shared_ptr<FakeCall> search(FakeConnection& connection, std::int64_t queryId, std::string query,
                                      Dictionary fields = {});
     std::int64_t counter(const std::string& name) { return device.counters.value("com.quorvane.tavrind." + name); }
-    /// From here on, an operation on files whose path contains `part` fails.
+    /// From now on, `operation` fails with `error` on files whose path contains `part`.
     void failOn(std::string operation, int error, std::string part = "");
 
     static constexpr const char* kBag =

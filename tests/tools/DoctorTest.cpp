@@ -19,7 +19,7 @@ Value json(const char* text)
     return platform::parseJson(text).value();
 }
 
-/// Sets the value at a path of keys, parted by dots.
+/// Sets the value at a path of keys, which are separated by dots.
 void set(Value& value, const std::string& path, const Value& to)
 {
     const auto dot = path.find('.');
