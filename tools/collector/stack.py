@@ -19,6 +19,7 @@ import subprocess
 import sys
 import tempfile
 import threading
+import time
 
 HERE = pathlib.Path(__file__).parent
 
@@ -136,6 +137,7 @@ if __name__ == "__main__":
                   os.path.abspath(options.certificate), os.path.abspath(options.key))
     try:
         print(f"{stack.https}/feedback takes uploads; psql '{stack.database}' has them", flush=True)
-        signal.pause()
+        while True:  # a handler runs between two steps: pause() would miss a signal that comes just before it
+            time.sleep(1)
     finally:
         stack.end()
