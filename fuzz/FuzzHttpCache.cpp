@@ -1,6 +1,6 @@
-#include <cstring>
 #include <filesystem>
 #include <fstream>
+#include <map>
 #include <unistd.h>
 
 #include "fuzz/Check.h"
@@ -15,6 +15,7 @@ namespace {
 
 namespace fs = std::filesystem;
 
+constexpr const char* kIndex = "index.db";
 constexpr HttpCacheStore::Limits kLimits{.capacity = 1u << 20, .minimumMappedSize = 64};
 const Date kNow = dateFromSecondsSince1970(1767225600);
 
@@ -55,10 +56,45 @@ void judge(HttpHeaders headers)
     check(confirmed(stored, notModified, kNow, kNow).body == stored.body);
 }
 
+/// As the loader hands them on, without NUL.
+HttpHeaders fieldsIn(std::string_view lines)
+{
+    HttpHeaders headers;
+    while (!lines.empty()) {
+        const std::string_view line = takeLine(lines);
+        const auto colon = line.find(':');
+        if (colon != std::string_view::npos && !line.contains('\0'))
+            headers.add(std::string(line.substr(0, colon)), std::string(line.substr(colon + 1)));
+    }
+    return headers;
+}
+
 FileSystem& files()
 {
     static const std::unique_ptr<FileSystem> system = makeSystemFiles();
     return *system;
+}
+
+/// The files of a cache that keeps two responses, by name. They are made once: that takes longer than to use them.
+const std::map<std::string, std::string>& soundCache()
+{
+    static const auto contents = [] {
+        const test::TemporaryDirectory directory;
+        {
+            auto store = HttpCacheStore::open(files(), directory.path, kLimits).value();
+            for (const std::size_t body : {10u, 100u}) {
+                const std::string key = "http://a/" + std::to_string(body);
+                check(store->put(key, answerFor(key, body)).has_value());
+            }
+        }
+        std::map<std::string, std::string> read;
+        for (const auto& entry : fs::directory_iterator(directory.path)) {
+            std::ifstream file(entry.path(), std::ios::binary);
+            read[entry.path().filename()].assign(std::istreambuf_iterator<char>(file), {});
+        }
+        return read;
+    }();
+    return contents;
 }
 
 /// Checks that a stored response is found unchanged or not at all, and that a cache that opens also works.
@@ -87,37 +123,22 @@ void use(const fs::path& directory)
 
 } // namespace
 
-/// The input is a service's header fields, line by line, and a whole index. If it begins with "~" it is changes to a
-/// sound index: the offset in two bytes, and the byte's new value.
+/// The input is a service's header fields, line by line; or, if it begins as a database does, a whole index; or, after
+/// a
+/// "~", changes to a sound index: the offset in two bytes, and the byte's new value.
 void runInput(std::string_view input)
 {
+    if (!input.starts_with("~") && !input.starts_with("SQLite")) return judge(fieldsIn(input));
+
     const test::TemporaryDirectory directory;
     std::string index(input);
     if (input.starts_with("~")) {
-        {
-            auto store = HttpCacheStore::open(files(), directory.path, kLimits).value();
-            for (const std::size_t body : {10u, 100u}) {
-                const std::string key = "http://a/" + std::to_string(body);
-                check(store->put(key, answerFor(key, body)).has_value());
-            }
-        }
-        std::ifstream file(directory / "index.db", std::ios::binary);
-        index.assign(std::istreambuf_iterator<char>(file), {});
+        for (const auto& [name, contents] : soundCache()) test::writeFile(directory / name, contents);
+        index = soundCache().at(kIndex);
         const auto byte = [&](std::size_t at) { return std::size_t{static_cast<unsigned char>(input[at])}; };
         for (std::size_t i = 1; i + 3 <= input.size(); i += 3)
             index[(byte(i) << 8 | byte(i + 1)) % index.size()] = input[i + 2];
-    } else {
-        HttpHeaders headers;
-        std::string_view rest = input;
-        while (!rest.empty()) {
-            const std::string_view line = takeLine(rest);
-            const auto colon = line.find(':');
-            // As the loader hands them on, without NUL.
-            if (colon != std::string_view::npos && !line.contains('\0'))
-                headers.add(std::string(line.substr(0, colon)), std::string(line.substr(colon + 1)));
-        }
-        judge(std::move(headers));
     }
-    test::writeFile(directory / "index.db", index);
+    test::writeFile(directory / kIndex, index);
     use(directory.path);
 }
