@@ -72,14 +72,9 @@ std::vector<Queued> uploadsIn(const redisReply& entries)
 
 } // namespace
 
-void Queue::Free::operator()(redisContext* context) const
-{
-    redisFree(context);
-}
-
 std::expected<Queue, std::string> Queue::connect(const std::string& socket)
 {
-    Queue queue(redisConnectUnixWithTimeout(socket.c_str(), kTimeout));
+    Queue queue(Context(redisConnectUnixWithTimeout(socket.c_str(), kTimeout), &redisFree));
     if (!queue._context) return std::unexpected("out of memory");
     if (queue._context->err != 0) return std::unexpected(std::string(queue._context->errstr));
     redisSetTimeout(queue._context.get(), kTimeout);

@@ -3,6 +3,7 @@
 #include <expected>
 #include <memory>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "tools/devserver/Http.h"
@@ -37,11 +38,9 @@ public:
     std::expected<void, std::string> remove(const std::string& id);
 
 private:
-    struct Free {
-        void operator()(redisContext* context) const;
-    };
-    explicit Queue(redisContext* context) : _context(context) {}
-    std::unique_ptr<redisContext, Free> _context;
+    using Context = std::unique_ptr<redisContext, void (*)(redisContext*)>;
+    explicit Queue(Context context) : _context(std::move(context)) {}
+    Context _context;
 };
 
 } // namespace collector

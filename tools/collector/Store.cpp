@@ -55,14 +55,9 @@ std::expected<void, std::string> run(pg_conn* connection, const char* statement,
 
 } // namespace
 
-void Store::Finish::operator()(pg_conn* connection) const
-{
-    PQfinish(connection);
-}
-
 std::expected<Store, std::string> Store::connect(const std::string& database)
 {
-    Store store(PQconnectdb(database.c_str()));
+    Store store(Connection(PQconnectdb(database.c_str()), &PQfinish));
     pg_conn* const connection = store._connection.get();
     if (PQstatus(connection) != CONNECTION_OK) return std::unexpected(std::string(PQerrorMessage(connection)));
     PQsetNoticeProcessor(connection, [](void*, const char*) {}, nullptr); // "already exists, skipping"

@@ -4,6 +4,7 @@
 #include <memory>
 #include <span>
 #include <string>
+#include <utility>
 
 #include "tools/collector/Queue.h"
 
@@ -11,8 +12,8 @@ struct pg_conn;
 
 namespace collector {
 
-/// The stored uploads and their events: the tables of schema.sql in PostgreSQL. Errors are texts; after one, make
-/// another `Store`. Use it on one thread.
+/// The stored uploads and their events: tables in PostgreSQL. Errors are texts; after one, make another
+/// `Store`. Use it on one thread.
 class Store {
 public:
     /// Connects, and makes the tables if they are missing.
@@ -23,11 +24,9 @@ public:
     std::expected<void, std::string> add(std::span<const Queued> uploads);
 
 private:
-    struct Finish {
-        void operator()(pg_conn* connection) const;
-    };
-    explicit Store(pg_conn* connection) : _connection(connection) {}
-    std::unique_ptr<pg_conn, Finish> _connection;
+    using Connection = std::unique_ptr<pg_conn, void (*)(pg_conn*)>;
+    explicit Store(Connection connection) : _connection(std::move(connection)) {}
+    Connection _connection;
 };
 
 } // namespace collector
