@@ -178,7 +178,12 @@ Result<void> HttpCacheStore::sweep()
     _lastUse = 0;
     bool sound = true;
     std::vector<std::int64_t> ids;
-    auto read = _index->run("SELECT id, size, used FROM entry ORDER BY id", {}, [&](const Sqlite::Row& row) {
+    // A damaged index of "entry" would hide responses, and those that are stored in their place.
+    auto read = _index->run("PRAGMA integrity_check(entry)", {},
+                            [&](const Sqlite::Row& row) { sound = sound && row.text(0) == "ok"; });
+    if (!read) return read;
+    if (!sound) return std::unexpected(damaged("a row and its index differ"));
+    read = _index->run("SELECT id, size, used FROM entry ORDER BY id", {}, [&](const Sqlite::Row& row) {
         const std::int64_t size = row.integer(1);
         sound = sound && size >= 0 && size <= static_cast<std::int64_t>(_limits.capacity) && row.integer(2) >= 0 &&
                 row.integer(2) < INT64_MAX / 2;
