@@ -1,13 +1,14 @@
 // Makes system calls and allocations of a program fail. `cc -shared -fPIC` makes a library of it, for LD_PRELOAD.
 //
 // FAILING_CONTROL names a file of at least 4 KiB, which is mapped as `struct control` and whose owner may change it at
-// any time. FAILING_BELOW is a directory: only calls on files below it, and on files in memory, count. Works under
-// AddressSanitizer, too: its functions call these.
+// any time. FAILING_BELOW is a directory: only calls on files below it, and on files in memory, count. They are written
+// to the end of the file FAILING_TRACE, a line each. Works under AddressSanitizer, too: its functions call these.
 #define _GNU_SOURCE
 #include <dirent.h>
 #include <dlfcn.h>
 #include <errno.h>
 #include <fcntl.h>
+#include <fnmatch.h>
 #include <linux/limits.h>
 #include <stdarg.h>
 #include <stdatomic.h>
@@ -29,10 +30,12 @@ static struct control {
     struct range calls, allocations;
     _Atomic uint64_t error; // of failing calls
     char what[1024];        // the last call that failed
+    char from[1024];        // a pattern: calls count from the first that matches; it is empty from then on
 }* control;
 
 static char below[PATH_MAX];
 static size_t belowSize;
+static int trace = -1;
 static _Atomic bool counted[65536]; // by descriptor
 
 __attribute__((constructor)) static void start(void)
@@ -44,6 +47,8 @@ __attribute__((constructor)) static void start(void)
     syscall(SYS_close, fd);
     if (fd < 0 || mapped == MAP_FAILED) abort();
     belowSize = (size_t)snprintf(below, sizeof(below), "%s/", directory);
+    const char* traced = getenv("FAILING_TRACE");
+    if (traced) trace = (int)syscall(SYS_openat, AT_FDCWD, traced, O_WRONLY | O_APPEND | O_CLOEXEC);
     control = mapped;
 }
 
@@ -58,8 +63,14 @@ static bool fails(struct range* range)
 // True if the call must fail; sets errno.
 static bool failsAt(const char* call, const char* path)
 {
-    if (!fails(&control->calls)) return false;
-    snprintf(control->what, sizeof(control->what), "%s %s", call, path);
+    char what[sizeof(control->what)];
+    const int size = snprintf(what, sizeof(what) - 1, "%s %s", call, path);
+    if (control->from[0] && fnmatch(control->from, what, 0) != 0) return false;
+    control->from[0] = 0;
+    const bool failing = fails(&control->calls);
+    if (failing) strcpy(control->what, what);
+    if (trace >= 0) (void)!syscall(SYS_write, trace, strcat(what, "\n"), size + 1);
+    if (!failing) return false;
     errno = (int)control->error;
     return true;
 }

@@ -38,14 +38,20 @@ class Failing:
         library, control = house.home / "failing.so", house.home / "failing.control"
         subprocess.run(["cc", "-std=gnu17", "-O1", "-Wall", "-Werror", "-shared", "-fPIC", "-o", library, SOURCE], check=True)
         control.write_bytes(bytes(mmap.PAGESIZE))
+        self.trace = house.home / "failing.trace"  # all calls, a line each
+        self.trace.touch()
         with control.open("r+b") as file:
             self._control = mmap.mmap(file.fileno(), mmap.PAGESIZE)
         self.calls, self.allocations = Range(self._control, 0), Range(self._control, 32)
-        house.wrapper = ["env", f"LD_PRELOAD={library}", f"FAILING_CONTROL={control}", f"FAILING_BELOW={house.home}"]
+        house.wrapper = ["env", f"LD_PRELOAD={library}", f"FAILING_CONTROL={control}", f"FAILING_BELOW={house.home}",
+                         f"FAILING_TRACE={self.trace}"]
 
-    def fail_calls(self, first, last, error):
+    def fail_calls(self, first, last, error, begin=""):
+        """Calls are counted from the first that matches the pattern `begin`, for example "rename */bag.plist"."""
         struct.pack_into("=Q", self._control, 64, error)
         self._control[72:72 + 1024] = bytes(1024)
+        self.calls.last = 0
+        self._control[72 + 1024:72 + 2048] = begin.encode().ljust(1024, b"\0")
         self.calls.fail(first, last)
 
     def what(self):
