@@ -48,6 +48,16 @@ std::size_t CurlLoad::maximumSize() const
     return _request.maximumResponseSize.value_or(_configuration.maximumResponseSize);
 }
 
+bool CurlLoad::mayUseHttp2(const UrlRequest& request, const UrlSessionConfiguration& configuration,
+                           const TransferFiles* files)
+{
+    // Over HTTP/2, libcurl 7.88 loses a status that arrives before the body is sent if the stream is reset after it. It
+    // reads for all transfers of a connection at once, and if the buffer of one is full, leaves the rest unprocessed,
+    // an end of a response included, until the connection has more data. The buffer must hold a whole response.
+    return !(files && files->upload) &&
+           request.maximumResponseSize.value_or(configuration.maximumResponseSize) <= kLargestBuffer;
+}
+
 int CurlLoad::status() const
 {
     long status = 0;
@@ -119,13 +129,9 @@ void CurlLoad::setOptions()
     // with it.
     set(CURLOPT_QUICK_EXIT, 1L);
     set(CURLOPT_PROTOCOLS_STR, "http,https");
-    // Over HTTP/2, libcurl 7.88 loses a status that arrives before the body is sent if the stream is reset after it. It
-    // reads for all transfers of a connection at once, and if the buffer of one is full, leaves the rest unprocessed,
-    // an end of a response included, until the connection has more data. The buffer must hold a whole response.
-    const bool mayUseHttp2 = _hop.url.scheme() == "https" && !hasUpload() && maximumSize() <= kLargestBuffer;
-    set(CURLOPT_HTTP_VERSION, static_cast<long>(mayUseHttp2 ? CURL_HTTP_VERSION_2TLS : CURL_HTTP_VERSION_1_1));
-    const std::size_t buffer =
-        mayUseHttp2 ? std::min(maximumSize() + kMaximumHeaderSize, kLargestBuffer) : kOrdinaryBuffer;
+    const bool isHttp2 = _hop.url.scheme() == "https" && mayUseHttp2(_request, _configuration, _files);
+    set(CURLOPT_HTTP_VERSION, static_cast<long>(isHttp2 ? CURL_HTTP_VERSION_2TLS : CURL_HTTP_VERSION_1_1));
+    const std::size_t buffer = isHttp2 ? std::min(maximumSize() + kMaximumHeaderSize, kLargestBuffer) : kOrdinaryBuffer;
     set(CURLOPT_BUFFERSIZE, static_cast<long>(buffer));
     // Over plain HTTP libcurl would delay every request until the first response.
     set(CURLOPT_PIPEWAIT, _configuration.pipelining && _files && _hop.url.scheme() == "https" ? 1L : 0L);

@@ -31,6 +31,12 @@ public:
     CurlLoad(const CurlLoad&) = delete;
     CurlLoad& operator=(const CurlLoad&) = delete;
 
+    /// Returns whether https hops of the load may use HTTP/2. Loads that may, and loads that may not, need multi
+    /// handles of their own: once a host has a connection over HTTP/2, libcurl 7.88 also shares those over HTTP/1.1
+    /// that are busy, and gives one load the response to another.
+    [[nodiscard]] static bool mayUseHttp2(const UrlRequest& request, const UrlSessionConfiguration& configuration,
+                                          const TransferFiles* files);
+
     /// Sets up the next hop on a new or reset handle. Returns false if it can't be sent; `finish` has the error.
     [[nodiscard]] bool prepare(CURL* easy);
     /// Call this after a transfer has ended with `code`. Returns true if a redirect must be followed: then call

@@ -27,12 +27,12 @@ namespace {
 /// Limit of idle connections to all hosts. Servers close them after seconds, and each takes a socket on both sides.
 constexpr long kIdleConnections = 32;
 
-/// Limit of the bytes of all incomplete bodies in memory: three of the largest, hundreds of ordinary ones.
+/// Limit of the bytes of a loader's incomplete bodies in memory: three of the largest, hundreds of ordinary ones.
 constexpr std::size_t kMaximumInMemory = 24u << 20;
 
 class CurlTask;
 
-/// Runs the loads of all sessions. libcurl's sockets and its timer are sources on a queue, which guards the multi
+/// Runs loads of all sessions. libcurl's sockets and its timer are sources on a queue, which guards the multi
 /// handle and everything else here: members are confined to it, except for `start`, `cancel` and `stop`.
 class Loader : public std::enable_shared_from_this<Loader> {
 public:
@@ -76,7 +76,7 @@ class CurlTask final : public UrlTask, public std::enable_shared_from_this<CurlT
 public:
     CurlTask(std::shared_ptr<Loader> loader, std::uint64_t identifier, UrlRequest request,
              UrlSessionConfiguration configuration, UrlSession::DataCompletion completion,
-             std::shared_ptr<Queue> delegateQueue, std::optional<TransferFiles> files = std::nullopt)
+             std::shared_ptr<Queue> delegateQueue, std::optional<TransferFiles> files)
         : _loader(std::move(loader)), _identifier(identifier), _request(std::move(request)),
           _configuration(std::move(configuration)), _completion(std::move(completion)),
           _delegateQueue(std::move(delegateQueue)), _files(std::move(files))
@@ -344,24 +344,36 @@ void Loader::watch(curl_socket_t socket, int what)
     source->setEvents(((what & CURL_POLL_IN) != 0 ? EPOLLIN : 0u) | ((what & CURL_POLL_OUT) != 0 ? EPOLLOUT : 0u));
 }
 
+/// The loaders of those loads that may use HTTP/2, and of the others: `CurlLoad::mayUseHttp2`.
+struct Loaders {
+    std::shared_ptr<Loader> http2;
+    std::shared_ptr<Loader> http1;
+};
+
 class CurlSession final : public UrlSession {
 public:
-    CurlSession(std::shared_ptr<Loader> loader, UrlSessionConfiguration configuration, std::shared_ptr<Queue> queue)
-        : _loader(std::move(loader)), _configuration(std::move(configuration)), _queue(std::move(queue))
+    CurlSession(Loaders loaders, UrlSessionConfiguration configuration, std::shared_ptr<Queue> queue)
+        : _loaders(std::move(loaders)), _configuration(std::move(configuration)), _queue(std::move(queue))
     {}
     std::shared_ptr<UrlTask> dataTask(UrlRequest request, DataCompletion completion) override
     {
-        return std::make_shared<CurlTask>(_loader, ++_lastIdentifier, std::move(request), _configuration,
-                                          std::move(completion), _queue);
+        return task(std::move(request), std::nullopt, std::move(completion));
     }
     std::shared_ptr<UrlTask> transferTask(UrlRequest request, TransferFiles files, DataCompletion completion) override
     {
-        return std::make_shared<CurlTask>(_loader, ++_lastIdentifier, std::move(request), _configuration,
-                                          std::move(completion), _queue, std::move(files));
+        return task(std::move(request), std::move(files), std::move(completion));
     }
 
 private:
-    std::shared_ptr<Loader> _loader;
+    std::shared_ptr<UrlTask> task(UrlRequest request, std::optional<TransferFiles> files, DataCompletion completion)
+    {
+        const bool http2 = CurlLoad::mayUseHttp2(request, _configuration, files ? &*files : nullptr);
+        return std::make_shared<CurlTask>(http2 ? _loaders.http2 : _loaders.http1, ++_lastIdentifier,
+                                          std::move(request), _configuration, std::move(completion), _queue,
+                                          std::move(files));
+    }
+
+    const Loaders _loaders;
     const UrlSessionConfiguration _configuration;
     std::shared_ptr<Queue> _queue;
     std::atomic<std::uint64_t> _lastIdentifier = 0;
@@ -369,19 +381,25 @@ private:
 
 class CurlLoader final : public UrlLoader {
 public:
-    CurlLoader(WorkerPool& pool, Clock& clock) : _loader(std::make_shared<Loader>(pool, clock)) {}
-    ~CurlLoader() override { _loader->stop(); }
+    CurlLoader(WorkerPool& pool, Clock& clock)
+        : _loaders{std::make_shared<Loader>(pool, clock), std::make_shared<Loader>(pool, clock)}
+    {}
+    ~CurlLoader() override
+    {
+        _loaders.http2->stop();
+        _loaders.http1->stop();
+    }
     std::shared_ptr<UrlSession> makeSession(UrlSessionConfiguration configuration,
                                             std::shared_ptr<Queue> delegateQueue) override
     {
         const auto cache = std::exchange(configuration.cache, std::nullopt);
-        auto session = std::make_shared<CurlSession>(_loader, std::move(configuration), delegateQueue);
+        auto session = std::make_shared<CurlSession>(_loaders, std::move(configuration), delegateQueue);
         if (!cache) return session;
         return makeCachingSession(std::move(session), HttpCache::make(*cache), std::move(delegateQueue));
     }
 
 private:
-    const std::shared_ptr<Loader> _loader;
+    const Loaders _loaders;
 };
 
 } // namespace

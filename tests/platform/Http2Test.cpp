@@ -1,6 +1,8 @@
 // Transfers that share a connection over HTTP/2.
 
 #include <algorithm>
+#include <atomic>
+#include <future>
 #include <random>
 #include <sys/mman.h>
 
@@ -33,10 +35,10 @@ std::string frame(FrameType type, char flags, std::uint32_t stream, std::string_
 
 constexpr std::size_t kTransfers = 24, kSize = 20'000;
 
-/// A server that waits for all requests, then sends the bodies with their frames mixed at random.
+/// A server that waits for so many requests, then sends the bodies with their frames mixed at random.
 class MixedAnswers {
 public:
-    explicit MixedAnswers(unsigned seed) : _random(seed) {}
+    explicit MixedAnswers(unsigned seed, std::size_t transfers = kTransfers) : _random(seed), _transfers(transfers) {}
 
     TestHttpServer::Answer operator()(const TestHttpServer::Request& request)
     {
@@ -52,7 +54,7 @@ public:
             if (_input[3] == kSettings && _input[4] != kAcknowledged) answer += frame(kSettings, kAcknowledged, 0);
             _input.erase(0, kFrameHeader + number(0, 3));
         }
-        if (_streams.size() == kTransfers) answer += answers();
+        if (_streams.size() == _transfers) answer += answers();
         return {answer};
     }
 
@@ -85,6 +87,7 @@ private:
     }
 
     std::minstd_rand _random;
+    std::size_t _transfers;
     std::string _input;
     std::vector<Stream> _streams;
 };
@@ -113,6 +116,36 @@ TEST_F(Http2Test, EveryTransferOfAListEndsHoweverTheFramesAreMixed)
         }
         EXPECT_EQ(server.connections(), 1);
     }
+}
+
+// libcurl would send the last load on the connection of the download, and take the one's response for the other's.
+TEST_F(Http2Test, ALoadDoesNotShareABusyHttp1Connection)
+{
+    std::atomic<int> http1Requests = 0;
+    std::promise<void> underWay;
+    TestHttpServer server(
+        [&, http2 = MixedAnswers(0, 1)](const TestHttpServer::Request& request) mutable -> TestHttpServer::Answer {
+            if (!request.body.starts_with("GET ")) return http2(request);
+            if (++http1Requests == 1) underWay.set_value();
+            return {};
+        },
+        {.certificate = certificate(), .anyProtocol = true});
+    const UrlSessionConfiguration configuration{.requestTimeout = 5s, .caFile = certificate().certificate};
+    TransferFiles files;
+    files.download = FileHandle(memfd_create("download", MFD_CLOEXEC));
+    const auto download =
+        make({.url = server.url(), .maximumResponseSize = 20u << 20}, configuration, std::move(files));
+    download->task->resume();
+    underWay.get_future().wait();
+
+    for (int i = 0; i < 2; ++i) {
+        const test::Outcome outcome = load(server.url(), configuration);
+        EXPECT_EQ(outcome.body().size(), kSize) << outcome.why();
+    }
+    EXPECT_EQ(http1Requests, 1);
+    EXPECT_EQ(server.connections(), 2);
+    download->task->cancel();
+    EXPECT_EQ(download->wait().code(), kUrlCancelled);
 }
 
 } // namespace
