@@ -30,7 +30,7 @@ def free_port():
 
 
 class Stack:
-    """The running parts, in a directory of their own. `https` is the address of the front end."""
+    """The running parts, in a directory of their own. `https` is the address of the front end, and `parts` has their processes."""
 
     def __init__(self, program, origin, certificate, key):
         self.directory = pathlib.Path(tempfile.mkdtemp(prefix="collector-"))
@@ -38,7 +38,7 @@ class Stack:
         self._as_store = []
         if os.geteuid() == 0:
             self._as_store = ["setpriv", "--reuid=postgres", "--regid=postgres", "--clear-groups"]
-        self._ended, self._lock, self._parts, self._threads = threading.Event(), threading.Lock(), {}, []
+        self._ended, self._lock, self.parts, self._threads = threading.Event(), threading.Lock(), {}, []
         try:
             self._start(program, origin, certificate, key)
         except BaseException:
@@ -85,8 +85,8 @@ class Stack:
             with self._lock, open(self.directory / "parts.log", "ab") as log:
                 if self._ended.is_set():
                     return None
-                self._parts[name] = subprocess.Popen(command, stdout=log, stderr=log, cwd="/", process_group=0)
-                return self._parts[name]
+                self.parts[name] = subprocess.Popen(command, stdout=log, stderr=log, cwd="/", process_group=0)
+                return self.parts[name]
 
         def run():
             while part := start():
@@ -99,7 +99,7 @@ class Stack:
     def kill(self, name):
         """The end of a part and of its processes, without a warning."""
         with contextlib.suppress(ProcessLookupError):
-            os.killpg(self._parts[name].pid, signal.SIGKILL)
+            os.killpg(self.parts[name].pid, signal.SIGKILL)
 
     def query(self, statement):
         """The rows of the store; each is a list of texts. None if the store is away."""
@@ -118,7 +118,7 @@ class Stack:
     def end(self):
         with self._lock:
             self._ended.set()
-        for name in self._parts:
+        for name in self.parts:
             self.kill(name)
         for thread in self._threads:
             thread.join()
