@@ -87,6 +87,17 @@ TEST_F(FleetTest, AnHoursOutageAtMostTriplesTheMean)
     EXPECT_LE(peak.untilNormal, 4h);
 }
 
+TEST_F(FleetTest, AClockThatIsSetBackDoesNotTurnNightIntoDay)
+{
+    const auto lastDay = [&](std::string_view name) {
+        const Traffic traffic = simulate(name, 300, 3, 1, 1h);
+        double requests = 0;
+        for (std::size_t bin = 48; bin < traffic.size(); ++bin) requests += traffic.requests(bin, {});
+        return requests;
+    };
+    EXPECT_NEAR(lastDay("clock-change") / lastDay("week"), 1, 0.1);
+}
+
 TEST_F(FleetTest, ADeviceKeepsToTheTimesOfItsPolicies)
 {
     assumptions.alwaysOn = assumptions.meteredShare = 1;

@@ -234,9 +234,9 @@ void SimulatedDevice::lookUp()
 
 void SimulatedDevice::changePower()
 {
-    _on = !_on;
+    const bool wasOn = std::exchange(_on, _habits.isOn(local())); // no change if the clock was set back meanwhile
     if (const auto change = _habits.nextPowerChange(local())) wait(kPower, *change - offset());
-    if (!_on) return;
+    if (!_on || wasOn) return;
     if (!_habits.suspends() || _updated) return start();
     _nextPass = std::max(_nextPass, _now);
     planPass();
