@@ -56,7 +56,7 @@ void judge(HttpHeaders headers)
     check(confirmed(stored, notModified, kNow, kNow).body == stored.body);
 }
 
-/// As the loader hands them on, without NUL.
+/// Returns the header fields of the lines. Skips lines with a NUL: the loader doesn't hand them on.
 HttpHeaders fieldsIn(std::string_view lines)
 {
     HttpHeaders headers;
@@ -123,9 +123,8 @@ void use(const fs::path& directory)
 
 } // namespace
 
-/// The input is a service's header fields, line by line; or, if it begins as a database does, a whole index; or, after
-/// a
-/// "~", changes to a sound index: the offset in two bytes, and the byte's new value.
+/// An input that begins with "SQLite" is a whole index. One that begins with "~" has changes to a sound index, three
+/// bytes each: an offset of two bytes, and the new value of the byte there. Any other is header fields, a line each.
 void runInput(std::string_view input)
 {
     if (!input.starts_with("~") && !input.starts_with("SQLite")) return judge(fieldsIn(input));

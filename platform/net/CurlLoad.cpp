@@ -51,9 +51,10 @@ std::size_t CurlLoad::maximumSize() const
 bool CurlLoad::mayUseHttp2(const UrlRequest& request, const UrlSessionConfiguration& configuration,
                            const TransferFiles* files)
 {
-    // Over HTTP/2, libcurl 7.88 loses a status that arrives before the body is sent if the stream is reset after it. It
-    // reads for all transfers of a connection at once, and if the buffer of one is full, leaves the rest unprocessed,
-    // an end of a response included, until the connection has more data. The buffer must hold a whole response.
+    // libcurl 7.88 has two faults over HTTP/2. If a server answers before it has the whole body and then resets the
+    // stream, the status is lost: no uploads. And libcurl reads for all transfers of a connection at once; while the
+    // buffer of one is full, it doesn't process what it has read for the others, until the server sends more. The
+    // buffer must therefore hold a whole response.
     return !(files && files->upload) &&
            request.maximumResponseSize.value_or(configuration.maximumResponseSize) <= kLargestBuffer;
 }

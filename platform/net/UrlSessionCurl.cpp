@@ -27,7 +27,8 @@ namespace {
 /// Limit of idle connections to all hosts. Servers close them after seconds, and each takes a socket on both sides.
 constexpr long kIdleConnections = 32;
 
-/// Limit of the bytes of a loader's incomplete bodies in memory: three of the largest, hundreds of ordinary ones.
+/// Limit of the bytes of a loader's incomplete bodies in memory: three of the largest, hundreds of ordinary ones. The
+/// bodies of loads that may not use HTTP/2 are in files.
 constexpr std::size_t kMaximumInMemory = 24u << 20;
 
 class CurlTask;
@@ -344,7 +345,7 @@ void Loader::watch(curl_socket_t socket, int what)
     source->setEvents(((what & CURL_POLL_IN) != 0 ? EPOLLIN : 0u) | ((what & CURL_POLL_OUT) != 0 ? EPOLLOUT : 0u));
 }
 
-/// The loaders of those loads that may use HTTP/2, and of the others: `CurlLoad::mayUseHttp2`.
+/// One loader runs the loads that may use HTTP/2 (`CurlLoad::mayUseHttp2`), the other one all others.
 struct Loaders {
     std::shared_ptr<Loader> http2;
     std::shared_ptr<Loader> http1;

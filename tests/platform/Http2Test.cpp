@@ -35,7 +35,7 @@ std::string frame(FrameType type, char flags, std::uint32_t stream, std::string_
 
 constexpr std::size_t kTransfers = 24, kSize = 20'000;
 
-/// A server that waits for so many requests, then sends the bodies with their frames mixed at random.
+/// A server that waits for `transfers` requests, and then answers them all, with their frames mixed at random.
 class MixedAnswers {
 public:
     explicit MixedAnswers(unsigned seed, std::size_t transfers = kTransfers) : _random(seed), _transfers(transfers) {}

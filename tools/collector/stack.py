@@ -137,7 +137,7 @@ if __name__ == "__main__":
                   os.path.abspath(options.certificate), os.path.abspath(options.key))
     try:
         print(f"{stack.https}/feedback takes uploads; psql '{stack.database}' has them", flush=True)
-        while True:  # a handler runs between two steps: pause() would miss a signal that comes just before it
+        while True:  # signal.pause() would wait on if a signal came just before it
             time.sleep(1)
     finally:
         stack.end()
