@@ -64,12 +64,13 @@ static bool fails(struct range* range)
 static bool failsAt(const char* call, const char* path)
 {
     char what[sizeof(control->what)];
-    const int size = snprintf(what, sizeof(what) - 1, "%s %s", call, path);
+    snprintf(what, sizeof(what) - 1, "%s %s", call, path);
     if (control->from[0] && fnmatch(control->from, what, 0) != 0) return false;
     control->from[0] = 0;
     const bool failing = fails(&control->calls);
     if (failing) strcpy(control->what, what);
-    if (trace >= 0) (void)!syscall(SYS_write, trace, strcat(what, "\n"), size + 1);
+    strcat(what, "\n");
+    if (trace >= 0) (void)!syscall(SYS_write, trace, what, strlen(what));
     if (!failing) return false;
     errno = (int)control->error;
     return true;
